@@ -1,0 +1,117 @@
+#include "apps/calmframe/demo_command.h"
+
+#include <algorithm>
+#include <cstdio>
+#include <filesystem>
+#include <memory>
+#include <vector>
+
+#include "apps/calmframe/progress_line.h"
+#include "host/media/clip.h"
+#include "platform/tessel/threads.h"
+#include "synthetic/scene.h"
+
+namespace calmframe {
+namespace {
+
+constexpr int kWidth = 1280;
+constexpr int kHeight = 720;
+
+media::EncodeSettings Encoding(const media::EncodeSettings& wanted) {
+  media::EncodeSettings settings = wanted;
+  settings.overwrite = true;  // the directory is the demo's own
+  return settings;
+}
+
+// A walk down a street with the camera held in the hand.
+synthetic::scene Street(int frames) {
+  synthetic::scene_options options;
+  options.width = kWidth;
+  options.height = kHeight;
+  options.frame_count = frames;
+  return synthetic::scene(synthetic::street(options.seed), synthetic::handheld_path({}), options);
+}
+
+void WriteSample(const std::string& path, int frames, const media::EncodeSettings& encode,
+                 pipeline::Listener& listener) {
+  media::ClipInfo info;
+  info.width = kWidth;
+  info.height = kHeight;
+  info.frame_rate = {30, 1};
+  info.frame_count = static_cast<std::size_t>(frames);
+  const auto writer = media::ClipWriter::Create(path, info, kWidth, kHeight, encode);
+  const synthetic::scene scene = Street(frames);
+  std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(kWidth) * kHeight);
+  constexpr std::ptrdiff_t kRowBytes = kWidth * sizeof(HX_Pixel8);
+  for (int f = 0; f < frames; ++f) {
+    if (listener.Cancelled()) throw pipeline::Interrupted();
+    listener.Progress("drawing", f, frames, "frames");
+    scene.render(f, pixels.data(), kWidth);
+    writer->Write(static_cast<std::size_t>(f), pixels.data(), kRowBytes);
+  }
+  writer->Finish();
+  listener.Progress("drawing", frames, frames, "frames");
+}
+
+void WriteSideBySide(const std::string& left_path, const std::string& right_path,
+                     const std::string& path, const media::EncodeSettings& encode,
+                     pipeline::Listener& listener) {
+  const auto left = media::ClipReader::Open(left_path);
+  const auto right = media::ClipReader::Open(right_path);
+  media::ClipInfo info = left->info();
+  const int width = info.width;
+  const auto writer = media::ClipWriter::Create(path, info, 2 * width, info.height, encode);
+  const std::ptrdiff_t row_bytes = 2 * width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8));
+  std::vector<HX_Pixel8> pixels(2 * static_cast<std::size_t>(width) *
+                                static_cast<std::size_t>(info.height));
+  const auto frames = static_cast<double>(info.frame_count);
+  for (std::size_t f = 0; f < info.frame_count; ++f) {
+    if (listener.Cancelled()) throw pipeline::Interrupted();
+    listener.Progress("pairing", static_cast<double>(f), frames, "frames");
+    left->Read(f, pixels.data(), row_bytes);
+    right->Read(f, pixels.data() + width, row_bytes);
+    writer->Write(f, pixels.data(), row_bytes);
+  }
+  writer->Finish();
+  listener.Progress("pairing", frames, frames, "frames");
+}
+
+}  // namespace
+
+DemoCommand::DemoCommand(CLI::App& program)
+    : command_(program.add_subcommand(
+          "demo", "Make a shaky sample, steady it, and show both side by side")) {
+  command_->add_option("DIR", directory_, "Where the three clips go")->capture_default_str();
+  command_->add_option("--frames", frames_, "Length of the sample")
+      ->check(CLI::Range(2, 100000))
+      ->capture_default_str();
+  AddControlFlags(*command_, controls_);
+  AddOutputFlags(*command_, flags_);
+}
+
+void DemoCommand::Run() {
+  const tessel::threads::ProcessorLimit limit(flags_.threads);
+  ProgressLine progress(flags_.quiet);
+  std::error_code error;
+  std::filesystem::create_directories(directory_, error);
+  if (error) {
+    throw media::Failure(media::Failure::Side::output, directory_ + ": " + error.message());
+  }
+  const std::filesystem::path directory(directory_);
+  const std::string shaky = directory / "shaky.mp4";
+  const std::string steady = directory / "steady.mp4";
+  const std::string both = directory / "side-by-side.mp4";
+  const media::EncodeSettings encode = Encoding(flags_.output.encode);
+
+  WriteSample(shaky, frames_, encode, progress);
+  pipeline::Output output = flags_.output;
+  output.path = steady;
+  output.encode = encode;
+  pipeline::Stabilize(shaky, controls_, output, progress);
+  WriteSideBySide(shaky, steady, both, encode, progress);
+  if (!flags_.quiet) {
+    std::fprintf(stderr, "wrote %s, %s and %s\n", shaky.c_str(), steady.c_str(), both.c_str());
+  }
+}
+
+}  // namespace calmframe

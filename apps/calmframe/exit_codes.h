@@ -1,0 +1,14 @@
+#pragma once
+
+namespace calmframe {
+
+enum ExitCode {
+  kDone = 0,
+  kUsage = 2,
+  kInput = 3,
+  kOutput = 4,
+  kSolveFailed = 5,
+  kInterrupted = 130,
+};
+
+}  // namespace calmframe

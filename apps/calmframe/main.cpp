@@ -1,0 +1,92 @@
+#include <CLI/CLI.hpp>
+#include <cstdio>
+#include <exception>
+#include <new>
+#include <string>
+#include <vector>
+
+#include "apps/calmframe/demo_command.h"
+#include "apps/calmframe/exit_codes.h"
+#include "apps/calmframe/nearest_match.h"
+#include "apps/calmframe/progress_line.h"
+#include "apps/calmframe/stabilize_command.h"
+#include "host/media/clip.h"
+#include "pipeline/stabilize.h"
+
+namespace calmframe {
+namespace {
+
+// The chosen command's flags and the commands' names, for a hint at a misspelt one.
+std::vector<std::string> KnownNames(const CLI::App& program) {
+  std::vector<std::string> names;
+  for (const CLI::App* command : program.get_subcommands({})) {
+    names.push_back(command->get_name());
+    for (const CLI::Option* option : command->get_options()) {
+      if (!option->get_lnames().empty()) names.push_back("--" + option->get_lnames()[0]);
+    }
+  }
+  return names;
+}
+
+int Fail(ExitCode code, const std::string& line) {
+  std::fprintf(stderr, "calmframe: %s\n", line.c_str());
+  return code;
+}
+
+int UsageFailure(const CLI::App& program, const CLI::ParseError& error, int argc, char** argv) {
+  std::string line = error.what();
+  for (char& c : line) {
+    if (c == '\n') c = ' ';
+  }
+  if (dynamic_cast<const CLI::ExtrasError*>(&error) ||
+      dynamic_cast<const CLI::RequiredError*>(&error)) {
+    const std::vector<std::string> names = KnownNames(program);
+    for (int i = 1; i < argc; ++i) {
+      const std::string word = std::string(argv[i]).substr(0, std::string(argv[i]).find('='));
+      const bool may_be_name = i == 1 || word.rfind("--", 0) == 0;
+      if (!may_be_name || std::find(names.begin(), names.end(), word) != names.end()) continue;
+      const std::string nearest = NearestMatch(word, names);
+      line = "unknown " + word + (nearest.empty() ? "" : "; did you mean " + nearest + "?");
+      break;
+    }
+  }
+  return Fail(kUsage, line + " (calmframe --help tells more)");
+}
+
+int Run(int argc, char** argv) {
+  CLI::App program("Steadies shaky video.", "calmframe");
+  program.require_subcommand(1);
+  StabilizeCommand stabilize(program);
+  DemoCommand demo(program);
+  try {
+    program.parse(argc, argv);
+  } catch (const CLI::Success& success) {
+    return program.exit(success);
+  } catch (const CLI::ParseError& error) {
+    return UsageFailure(program, error, argc, argv);
+  }
+
+  CatchInterrupts();
+  try {
+    if (stabilize.chosen()) stabilize.Run();
+    if (demo.chosen()) demo.Run();
+    return kDone;
+  } catch (const pipeline::Interrupted&) {
+    return Fail(kInterrupted, "interrupted; nothing was written");
+  } catch (const media::Failure& failure) {
+    return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what());
+  } catch (const pipeline::SolveFailure& failure) {
+    return Fail(kSolveFailed, failure.what());
+  } catch (const std::bad_alloc&) {
+    return Fail(kSolveFailed, "out of memory");
+  } catch (const std::exception& error) {
+    return Fail(kSolveFailed, error.what());
+  }
+}
+
+}  // namespace
+}  // namespace calmframe
+
+int main(int argc, char** argv) {
+  return calmframe::Run(argc, argv);
+}

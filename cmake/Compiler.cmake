@@ -1,0 +1,32 @@
+# Language, warnings and sanitizers. Warnings stop a build only where CALMFRAME_WERROR asks for it (the checks), so that a
+# newer compiler's new warnings never stop someone who just wants the program.
+
+set(CMAKE_CXX_STANDARD 20)
+set(CMAKE_CXX_STANDARD_REQUIRED ON)
+set(CMAKE_CXX_EXTENSIONS OFF)
+set(CMAKE_POSITION_INDEPENDENT_CODE ON)
+set(CMAKE_EXPORT_COMPILE_COMMANDS ON)
+
+if(NOT CMAKE_BUILD_TYPE)
+  set(CMAKE_BUILD_TYPE Release)
+endif()
+
+find_program(CCACHE ccache)
+if(CCACHE)
+  set(CMAKE_CXX_COMPILER_LAUNCHER "${CCACHE}")
+  set(CMAKE_C_COMPILER_LAUNCHER "${CCACHE}")
+endif()
+
+option(CALMFRAME_WERROR "Treat warnings as errors" OFF)
+set(CALMFRAME_SANITIZE "" CACHE STRING "Sanitizers, as given to -fsanitize=")
+
+# Two pixels computed by one formula must be bit-equal wherever they stand, so the compiler may not contract a*b+c on its
+# own: a vector body and its scalar tail would round differently.
+add_compile_options(-Wall -Wextra -Wshadow -Wconversion -Wno-sign-conversion -ffp-contract=off)
+if(CALMFRAME_WERROR)
+  add_compile_options(-Werror)
+endif()
+if(CALMFRAME_SANITIZE)
+  add_compile_options(-fsanitize=${CALMFRAME_SANITIZE} -fno-omit-frame-pointer -fno-sanitize-recover=all)
+  add_link_options(-fsanitize=${CALMFRAME_SANITIZE})
+endif()

@@ -1,0 +1,21 @@
+# Everything from outside, found once, as targets.
+
+find_package(Threads REQUIRED)
+find_package(Boost 1.74 REQUIRED COMPONENTS thread)
+find_package(TBB REQUIRED)
+find_package(PkgConfig REQUIRED)
+pkg_check_modules(HWY REQUIRED IMPORTED_TARGET libhwy)
+pkg_check_modules(FFMPEG REQUIRED IMPORTED_TARGET libavformat libavcodec libavutil libswscale libavfilter)
+find_library(OPENBLAS_LIBRARY openblas REQUIRED)
+find_library(LAPACK_LIBRARY lapack REQUIRED)
+find_library(CHOLMOD_LIBRARY cholmod REQUIRED)
+find_path(CHOLMOD_INCLUDE_DIR cholmod.h PATH_SUFFIXES suitesparse REQUIRED)
+
+if(CALMFRAME_TESTS)
+  find_package(GTest REQUIRED)
+  include(GoogleTest)
+endif()
+if(CALMFRAME_BENCH)
+  find_package(benchmark REQUIRED)
+  find_package(OpenCV REQUIRED COMPONENTS core imgproc video)
+endif()

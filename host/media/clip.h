@@ -1,0 +1,119 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "platform/hx/hx_pixel.h"
+
+// Video files in and out. Frames are numbered 0 .. frame_count - 1 in the order shown, each exactly
+// one frame of the file whatever its time stamp. Pixels are as shown: rotation metadata is applied,
+// pixel aspect is not.
+namespace calmframe::media {
+
+// What went wrong with a file, in one line that names it. `input`: reading; `output`: writing.
+class Failure : public std::runtime_error {
+ public:
+  enum class Side { input, output };
+  Failure(Side failed_side, const std::string& line)
+      : std::runtime_error(line), side(failed_side) {}
+  const Side side;
+};
+
+struct Ratio {
+  std::int64_t num = 1;
+  std::int64_t den = 1;
+};
+
+enum class FieldOrder { progressive, top_first, bottom_first };
+
+// Time of a frame, in ticks of the clip's time base. Strictly ascending from frame to frame: where
+// the file lacks a time stamp or repeats one, the next free tick stands.
+struct FrameTime {
+  std::int64_t pts = 0;
+  std::int64_t duration = 0;
+};
+
+// The file's colour tags as it has them, code points of ITU-T H.273 (2: unspecified).
+struct ColourTags {
+  int primaries = 2;
+  int transfer = 2;
+  int matrix = 2;
+  int range = 0;            // 0 unspecified, 1 limited, 2 full
+  int chroma_location = 0;  // 0 unspecified, 1 left, 2 centre, 3 top left, 4 top, 5, 6 bottom
+};
+
+struct ClipInfo {
+  std::string path;  // empty: made, not read; such a clip has no other streams
+  int width = 0;     // as shown
+  int height = 0;
+  Ratio pixel_aspect;  // width : height of one pixel as shown
+  Ratio frame_rate;    // average; a clip with varying rate keeps its own time stamps
+  std::size_t frame_count = 0;
+  Ratio time_base{1, 25};        // of times, in seconds a tick
+  std::vector<FrameTime> times;  // one a frame; empty for a made clip: even times at frame_rate
+  std::string codec;             // of the video stream
+  int bit_depth = 8;             // of a component in the file
+  bool has_alpha = false;
+  int rotation = 0;  // degrees clockwise that were applied to the pixels: 0, 90, 180 or 270
+  ColourTags colour;
+  FieldOrder field_order = FieldOrder::progressive;
+  int stream = -1;      // the video stream's place in the file
+  std::string warning;  // one line, empty when all is well: a damaged stream, and how many frames
+                        // of it decode
+};
+
+// Reads any frame of a clip's first video stream. For one thread at a time.
+class ClipReader {
+ public:
+  // Opens the file and finds every frame. Throws Failure (input).
+  static std::unique_ptr<ClipReader> Open(const std::string& path);
+  virtual ~ClipReader() = default;
+
+  virtual const ClipInfo& info() const = 0;
+
+  // Writes frame `frame` into info().height rows of info().width pixels, row_bytes apart, alpha as
+  // in the file or full. Ascending frames are decoded ahead on a thread of the reader's own. Throws
+  // Failure (input).
+  virtual void Read(std::size_t frame, HX_Pixel8* pixels, std::ptrdiff_t row_bytes) = 0;
+  virtual void Read(std::size_t frame, HX_Pixel16* pixels, std::ptrdiff_t row_bytes) = 0;
+  virtual void Read(std::size_t frame, HX_PixelFloat* pixels, std::ptrdiff_t row_bytes) = 0;
+};
+
+struct EncodeSettings {
+  std::string codec;  // an encoder's or codec's name; empty: H.264 (or what the container takes)
+  int crf = 18;       // for encoders with such a setting; for other lossy ones a like quality
+  std::string pixel_format;  // empty: 4:2:0 of the source's bit depth
+  bool overwrite = false;
+};
+
+// Writes a clip beside the source's other streams. Everything goes to a name of its own beside
+// `path`, which Finish renames; a writer destroyed before leaves nothing.
+class ClipWriter {
+ public:
+  // width, height: of the written frames, in the source's pixel aspect; with an odd one the default
+  // pixel format is 4:4:4, which alone keeps the size. `path` "-": raw frames (YUV4MPEG2) to the
+  // standard output, nothing else. Everything that can be refused is refused here, so a program
+  // creates the writer before it spends time on the frames. Throws Failure (output).
+  static std::unique_ptr<ClipWriter> Create(const std::string& path, const ClipInfo& source,
+                                            int width, int height, const EncodeSettings& settings);
+  virtual ~ClipWriter() = default;
+
+  // Frames in strictly ascending order; `frame` takes the time stamp and duration of that frame of
+  // the source. Transparent pixels show black where the codec has no alpha. Throws Failure
+  // (output).
+  virtual void Write(std::size_t frame, const HX_Pixel8* pixels, std::ptrdiff_t row_bytes) = 0;
+  virtual void Write(std::size_t frame, const HX_Pixel16* pixels, std::ptrdiff_t row_bytes) = 0;
+  virtual void Write(std::size_t frame, const HX_PixelFloat* pixels, std::ptrdiff_t row_bytes) = 0;
+
+  // One line for each thing that the written file leaves out or changes. Whole after Finish.
+  virtual const std::vector<std::string>& warnings() const = 0;
+
+  // Copies what is left of the other streams, closes the file, gives it its name.
+  virtual void Finish() = 0;
+};
+
+}  // namespace calmframe::media

@@ -1,0 +1,149 @@
+#include "host/media/decoder.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <string_view>
+
+namespace calmframe::media {
+namespace {
+
+[[noreturn]] void Fail(const std::string& path, const std::string& cause) {
+  throw Failure(Failure::Side::input, path + ": " + cause);
+}
+
+// Many damaged packets in a row end the stream: some demuxers return the same error for ever.
+constexpr int kErrorLimit = 1000;
+
+}  // namespace
+
+InputPtr OpenInput(const std::string& path) {
+  av_log_set_level(AV_LOG_QUIET);
+  struct stat status;
+  if (stat(path.c_str(), &status) != 0) Fail(path, std::strerror(errno));
+  if (S_ISDIR(status.st_mode)) Fail(path, "is a directory");
+  if (!S_ISREG(status.st_mode)) Fail(path, "is not a file on disk");
+  if (access(path.c_str(), R_OK) != 0) Fail(path, std::strerror(errno));
+  if (status.st_size == 0) Fail(path, "is empty");
+
+  AVFormatContext* opened = nullptr;
+  AVDictionary* options = nullptr;
+  av_dict_set(&options, "protocol_whitelist", "file", 0);
+  int error = avformat_open_input(&opened, ("file:" + path).c_str(), nullptr, &options);
+  av_dict_free(&options);
+  if (error < 0) Fail(path, "not a video file, or damaged at its start: " + ErrorText(error));
+  InputPtr container(opened);
+  // Text is shown as pictures by this one.
+  if (std::string_view(container->iformat->name) == "tty") Fail(path, "not a video file");
+  error = avformat_find_stream_info(container.get(), nullptr);
+  if (error < 0) Fail(path, "its streams can't be read: " + ErrorText(error));
+  return container;
+}
+
+Decoder::Decoder(const std::string& path) : path_(path), packet_(NewPacket()) {
+  Open();
+}
+
+void Decoder::Open() {
+  codec_.reset();
+  container_ = OpenInput(path_);
+  stream_ = nullptr;
+  draining_ = false;
+  errors_in_a_row_ = 0;
+
+  int best = av_find_best_stream(container_.get(), AVMEDIA_TYPE_VIDEO, -1, -1, nullptr, 0);
+  for (unsigned i = 0; best < 0 && i < container_->nb_streams; ++i) {
+    if (container_->streams[i]->codecpar->codec_type == AVMEDIA_TYPE_VIDEO)
+      best = static_cast<int>(i);
+  }
+  if (best < 0 || (container_->streams[best]->disposition & AV_DISPOSITION_ATTACHED_PIC)) {
+    Fail(path_, "has no video stream");
+  }
+  stream_ = container_->streams[best];
+  const AVCodecParameters& parameters = *stream_->codecpar;
+  if (std::int64_t{parameters.width} * parameters.height > kMaximumPixels) {
+    Fail(path_, "frames of " + std::to_string(parameters.width) + " x " +
+                    std::to_string(parameters.height) + " pixels are too large");
+  }
+  const AVCodec* decoder = avcodec_find_decoder(parameters.codec_id);
+  if (!decoder) {
+    Fail(path_, std::string("no decoder for ") + avcodec_get_name(parameters.codec_id));
+  }
+  codec_.reset(NotNull(avcodec_alloc_context3(decoder)));
+  int error = avcodec_parameters_to_context(codec_.get(), &parameters);
+  codec_->pkt_timebase = stream_->time_base;
+  codec_->thread_count = 0;
+  codec_->thread_type = FF_THREAD_FRAME | FF_THREAD_SLICE;
+  codec_->max_pixels = kMaximumPixels;
+  if (error >= 0) error = avcodec_open2(codec_.get(), decoder, nullptr);
+  if (error < 0) Fail(path_, std::string("decoder ") + decoder->name + ": " + ErrorText(error));
+}
+
+bool Decoder::Feed() {
+  while (!draining_) {
+    const int error = av_read_frame(container_.get(), packet_.get());
+    if (error == AVERROR(ENOMEM)) throw std::bad_alloc();
+    if (error < 0 && error != AVERROR_EOF && ++errors_in_a_row_ < kErrorLimit) {
+      ++damage_;
+      // Only such a demuxer is worth asking again; a failing disk stays as it is.
+      if (error == AVERROR_INVALIDDATA || error == AVERROR(EAGAIN)) continue;
+    }
+    if (error < 0) {
+      draining_ = true;
+      return avcodec_send_packet(codec_.get(), nullptr) >= 0;
+    }
+    const AVStream& from = *container_->streams[packet_->stream_index];
+    if (packet_->pts != AV_NOPTS_VALUE) {
+      last_time_ = std::max(last_time_, av_rescale_q(packet_->pts + packet_->duration,
+                                                     from.time_base, AV_TIME_BASE_Q));
+    }
+    if (&from != stream_) {
+      av_packet_unref(packet_.get());
+      continue;
+    }
+    if (packet_->flags & AV_PKT_FLAG_CORRUPT) ++damage_;
+    const int sent = avcodec_send_packet(codec_.get(), packet_.get());
+    av_packet_unref(packet_.get());
+    if (sent == AVERROR(ENOMEM)) throw std::bad_alloc();
+    if (sent < 0) ++damage_;
+    return true;
+  }
+  return false;
+}
+
+FramePtr Decoder::Next() {
+  FramePtr frame = NewFrame();
+  for (;;) {
+    const int error = avcodec_receive_frame(codec_.get(), frame.get());
+    if (error == 0) {
+      errors_in_a_row_ = 0;
+      if (frame->decode_error_flags || (frame->flags & AV_FRAME_FLAG_CORRUPT)) ++damage_;
+      return frame;
+    }
+    if (error == AVERROR_EOF) return nullptr;
+    if (error == AVERROR(ENOMEM)) throw std::bad_alloc();
+    if (error == AVERROR(EAGAIN)) {
+      if (!Feed()) return nullptr;
+      continue;
+    }
+    ++damage_;
+    if (++errors_in_a_row_ >= kErrorLimit) return nullptr;
+  }
+}
+
+bool Decoder::Seek(std::int64_t pts) {
+  if (av_seek_frame(container_.get(), stream_->index, pts, AVSEEK_FLAG_BACKWARD) < 0) return false;
+  avcodec_flush_buffers(codec_.get());
+  draining_ = false;
+  errors_in_a_row_ = 0;
+  return true;
+}
+
+void Decoder::Rewind() {
+  Open();
+}
+
+}  // namespace calmframe::media

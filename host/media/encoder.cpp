@@ -1,0 +1,250 @@
+#include "host/media/encoder.h"
+
+#include <algorithm>
+#include <cstring>
+#include <numeric>
+
+namespace calmframe::media {
+namespace {
+
+std::size_t EditDistance(const std::string& a, const std::string& b) {
+  std::vector<std::size_t> row(b.size() + 1);
+  std::iota(row.begin(), row.end(), std::size_t{0});
+  for (std::size_t i = 0; i < a.size(); ++i) {
+    std::size_t diagonal = row[0]++;
+    for (std::size_t j = 0; j < b.size(); ++j) {
+      const std::size_t replaced = diagonal + (a[i] != b[j]);
+      diagonal = row[j + 1];
+      row[j + 1] = std::min({replaced, diagonal + 1, row[j] + 1});
+    }
+  }
+  return row.back();
+}
+
+std::string Nearest(const std::string& name, const std::vector<std::string>& known) {
+  return *std::min_element(known.begin(), known.end(), [&](const auto& a, const auto& b) {
+    return EditDistance(name, a) < EditDistance(name, b);
+  });
+}
+
+const AVCodec* FindEncoder(const std::string& name) {
+  const AVCodec* codec = avcodec_find_encoder_by_name(name.c_str());
+  if (!codec) {
+    const AVCodecDescriptor* described = avcodec_descriptor_get_by_name(name.c_str());
+    if (described) codec = avcodec_find_encoder(described->id);
+  }
+  return codec && codec->type == AVMEDIA_TYPE_VIDEO ? codec : nullptr;
+}
+
+std::vector<std::string> EncoderNames() {
+  std::vector<std::string> names;
+  void* at = nullptr;
+  while (const AVCodec* codec = av_codec_iterate(&at)) {
+    if (!av_codec_is_encoder(codec) || codec->type != AVMEDIA_TYPE_VIDEO) continue;
+    names.emplace_back(codec->name);
+    names.emplace_back(avcodec_get_name(codec->id));
+  }
+  return names;
+}
+
+AVPixelFormat ChoosePixelFormat(const std::string& shown, const AVCodec& codec,
+                                const ClipInfo& source, int width, int height,
+                                const std::string& name) {
+  std::vector<AVPixelFormat> usable;
+  for (const AVPixelFormat* f = codec.pix_fmts; f && *f != AV_PIX_FMT_NONE; ++f) {
+    if (sws_isSupportedOutput(*f)) usable.push_back(*f);
+  }
+  const auto has = [&](AVPixelFormat f) {
+    return !codec.pix_fmts || std::find(usable.begin(), usable.end(), f) != usable.end();
+  };
+  if (!name.empty()) {
+    const AVPixelFormat asked = av_get_pix_fmt(name.c_str());
+    if (asked != AV_PIX_FMT_NONE && sws_isSupportedOutput(asked) && has(asked)) return asked;
+    std::vector<std::string> names;
+    for (const AVPixelFormat f : usable) names.emplace_back(av_get_pix_fmt_name(f));
+    if (names.empty()) names = {"yuv420p", "yuv422p", "yuv444p", "yuv420p10le"};
+    throw Failure(Failure::Side::output, shown + ": pixel format '" + name + "' is not one of " +
+                                             codec.name + "'s, the nearest is '" +
+                                             Nearest(name, names) + "'");
+  }
+  const bool odd = width % 2 != 0 || height % 2 != 0;
+  const bool deep = source.bit_depth > 8;
+  const AVPixelFormat shallow = odd ? AV_PIX_FMT_YUV444P : AV_PIX_FMT_YUV420P;
+  const AVPixelFormat wanted = deep ? (odd ? AV_PIX_FMT_YUV444P10 : AV_PIX_FMT_YUV420P10) : shallow;
+  if (has(wanted)) return wanted;
+  if (has(shallow)) return shallow;
+  AVPixelFormat best = AV_PIX_FMT_NONE;
+  for (const AVPixelFormat f : usable) {
+    best = best == AV_PIX_FMT_NONE ? f : av_find_best_pix_fmt_of_2(best, f, wanted, 0, nullptr);
+  }
+  if (best == AV_PIX_FMT_NONE) {
+    throw Failure(Failure::Side::output,
+                  shown + ": encoder " + codec.name + " takes no frames from memory");
+  }
+  return best;
+}
+
+}  // namespace
+
+Encoder::Encoder(const std::string& shown, const AVOutputFormat& format, const ClipInfo& source,
+                 int width, int height, const EncodeSettings& settings,
+                 std::vector<std::string>& warnings)
+    : shown_(shown), source_(source), width_(width), height_(height) {
+  const AVCodec* codec = nullptr;
+  if (!settings.codec.empty()) {
+    codec = FindEncoder(settings.codec);
+    if (!codec) {
+      throw Failure(Failure::Side::output, shown + ": no video codec '" + settings.codec +
+                                               "', the nearest is '" +
+                                               Nearest(settings.codec, EncoderNames()) + "'");
+    }
+    if (avformat_query_codec(&format, codec->id, FF_COMPLIANCE_UNOFFICIAL) == 0) {
+      throw Failure(Failure::Side::output, shown + ": a " + format.name + " file can't hold " +
+                                               avcodec_get_name(codec->id));
+    }
+  } else {
+    const bool h264 = avformat_query_codec(&format, AV_CODEC_ID_H264, FF_COMPLIANCE_NORMAL) == 1 ||
+                      format.video_codec == AV_CODEC_ID_H264 ||
+                      std::strcmp(format.name, "mpegts") == 0;
+    codec = avcodec_find_encoder(h264 ? AV_CODEC_ID_H264 : format.video_codec);
+    if (!codec) {
+      throw Failure(Failure::Side::output,
+                    shown + ": no encoder for a " + std::string(format.name) + " file");
+    }
+  }
+  even_times_ = !(format.flags & AVFMT_VARIABLE_FPS);
+  const AVPixelFormat pixel_format =
+      ChoosePixelFormat(shown, *codec, source, width, height, settings.pixel_format);
+  int error = 0;
+  by_number_ = even_times_;
+  if (!Open(*codec, format, source, settings, pixel_format, error)) {
+    by_number_ = true;  // MPEG-4 and older have coarse clocks
+    if (!Open(*codec, format, source, settings, pixel_format, error)) {
+      throw Failure(Failure::Side::output,
+                    shown + ": encoder " + codec->name + " refuses " + std::to_string(width) +
+                        " x " + std::to_string(height) + " " + av_get_pix_fmt_name(pixel_format) +
+                        ", crf " + std::to_string(settings.crf) + ": " + ErrorText(error));
+    }
+  }
+  clock_ = even_times_ ? codec_->time_base : ToRational(source.time_base);
+  if (source.times.empty()) clock_ = codec_->time_base;
+  if (even_times_ && !source.times.empty()) {
+    const auto& times = source.times;
+    const AVRational tick = ToRational(source.time_base);
+    for (std::size_t i = 0; i < times.size(); ++i) {
+      const std::int64_t even = av_rescale_q(static_cast<std::int64_t>(i), codec_->time_base, tick);
+      if (std::abs(times[i].pts - times[0].pts - even) > 1) {
+        warnings.push_back(shown + ": " + format.name +
+                           " has one frame rate: uneven time stamps are evened out");
+        break;
+      }
+    }
+  }
+}
+
+bool Encoder::Open(const AVCodec& codec, const AVOutputFormat& format, const ClipInfo& source,
+                   const EncodeSettings& settings, AVPixelFormat pixel_format, int& error) {
+  codec_.reset(NotNull(avcodec_alloc_context3(&codec)));
+  AVCodecContext& c = *codec_;
+  c.width = width_;
+  c.height = height_;
+  c.pix_fmt = pixel_format;
+  c.sample_aspect_ratio = ToRational(source.pixel_aspect);
+  c.framerate = ToRational(source.frame_rate);
+  if (codec.supported_framerates) {
+    c.framerate =
+        codec.supported_framerates[av_find_nearest_q_idx(c.framerate, codec.supported_framerates)];
+  }
+  const bool numbered = by_number_ || source.times.empty();
+  c.time_base = numbered ? av_inv_q(c.framerate) : ToRational(source.time_base);
+  if (by_number_) c.max_b_frames = 0;
+  c.thread_count = 0;
+  c.strict_std_compliance = FF_COMPLIANCE_UNOFFICIAL;
+  if (format.flags & AVFMT_GLOBALHEADER) c.flags |= AV_CODEC_FLAG_GLOBAL_HEADER;
+
+  const AVPixFmtDescriptor& layout = *av_pix_fmt_desc_get(pixel_format);
+  model_ = ModelOf(source.colour, pixel_format, source.width, source.height);
+  c.color_primaries = static_cast<AVColorPrimaries>(source.colour.primaries);
+  c.color_trc = static_cast<AVColorTransferCharacteristic>(source.colour.transfer);
+  if (layout.flags & AV_PIX_FMT_FLAG_RGB) {
+    c.colorspace = AVCOL_SPC_RGB;
+    c.color_range = AVCOL_RANGE_JPEG;
+  } else {
+    const bool silent = source.colour.matrix == AVCOL_SPC_UNSPECIFIED;
+    c.colorspace = silent ? AVCOL_SPC_UNSPECIFIED : model_.matrix;
+    // RGB sources say "full", which for YUV is the uncommon choice.
+    if (source.colour.matrix == AVCOL_SPC_RGB) model_.full_range = false;
+    c.color_range = model_.full_range                                ? AVCOL_RANGE_JPEG
+                    : source.colour.range == AVCOL_RANGE_UNSPECIFIED ? AVCOL_RANGE_UNSPECIFIED
+                                                                     : AVCOL_RANGE_MPEG;
+  }
+  c.chroma_sample_location = static_cast<AVChromaLocation>(source.colour.chroma_location);
+
+  const bool interlaced = source.field_order != FieldOrder::progressive && height_ % 4 == 0;
+  model_.fields = interlaced;
+  if (interlaced) {
+    const bool top = source.field_order == FieldOrder::top_first;
+    c.field_order = top ? AV_FIELD_TT : AV_FIELD_BB;
+    c.flags |= AV_CODEC_FLAG_INTERLACED_DCT;
+  }
+
+  error = 0;
+  if (c.priv_data && av_opt_find(c.priv_data, "crf", nullptr, 0, 0)) {
+    error = av_opt_set(c.priv_data, "crf", std::to_string(settings.crf).c_str(), 0);
+    if (error < 0) return false;
+    c.bit_rate = 0;  // else it bounds the quality
+  } else {
+    c.flags |= AV_CODEC_FLAG_QSCALE;
+    c.global_quality = FF_QP2LAMBDA * std::clamp(settings.crf / 6, 1, 31);
+  }
+  error = avcodec_open2(&c, &codec, nullptr);
+  return error >= 0;
+}
+
+FrameTime Encoder::TimeOf(std::size_t number) const {
+  const auto n = static_cast<std::int64_t>(number);
+  if (source_.times.empty()) return {n, 1};
+  if (!even_times_) return source_.times.at(number);
+  return {n + av_rescale_q(source_.times[0].pts, ToRational(source_.time_base), clock_), 1};
+}
+
+void Encoder::Send(std::size_t number, FramePtr frame) {
+  if (frame) {
+    frame->pts = by_number_ ? static_cast<std::int64_t>(number) : TimeOf(number).pts;
+    numbers_[frame->pts] = number;
+    if (codec_->flags & AV_CODEC_FLAG_INTERLACED_DCT) {
+      frame->interlaced_frame = 1;
+      frame->top_field_first = codec_->field_order == AV_FIELD_TT;
+    }
+    frame->sample_aspect_ratio = codec_->sample_aspect_ratio;
+    frame->color_primaries = codec_->color_primaries;
+    frame->color_trc = codec_->color_trc;
+    frame->colorspace = codec_->colorspace;
+    frame->color_range = codec_->color_range;
+    frame->chroma_location = codec_->chroma_sample_location;
+    if (codec_->flags & AV_CODEC_FLAG_QSCALE) frame->quality = codec_->global_quality;
+  }
+  const int error = avcodec_send_frame(codec_.get(), frame.get());
+  if (error < 0 && error != AVERROR_EOF) {
+    throw Failure(Failure::Side::output, shown_ + ": encoding failed: " + ErrorText(error));
+  }
+}
+
+PacketPtr Encoder::Receive() {
+  PacketPtr packet = NewPacket();
+  const int error = avcodec_receive_packet(codec_.get(), packet.get());
+  if (error == AVERROR(EAGAIN) || error == AVERROR_EOF) return nullptr;
+  if (error < 0) {
+    throw Failure(Failure::Side::output, shown_ + ": encoding failed: " + ErrorText(error));
+  }
+  const auto found = numbers_.find(packet->pts);
+  if (found != numbers_.end()) {
+    const FrameTime time = TimeOf(found->second);
+    packet->duration = time.duration;
+    if (by_number_) packet->pts = packet->dts = time.pts;
+    numbers_.erase(found);
+  }
+  return packet;
+}
+
+}  // namespace calmframe::media

@@ -1,0 +1,70 @@
+#pragma once
+
+extern "C" {
+#include <libavcodec/avcodec.h>
+#include <libavformat/avformat.h>
+#include <libavutil/avutil.h>
+#include <libavutil/display.h>
+#include <libavutil/frame.h>
+#include <libavutil/imgutils.h>
+#include <libavutil/mathematics.h>
+#include <libavutil/opt.h>
+#include <libavutil/pixdesc.h>
+#include <libswscale/swscale.h>
+}
+
+#include <memory>
+#include <new>
+#include <string>
+
+#include "host/media/clip.h"
+
+// Ownership of FFmpeg's objects. FFmpeg's own log is silenced where a file is opened.
+namespace calmframe::media {
+
+struct FfmpegDelete {
+  void operator()(AVFrame* frame) const { av_frame_free(&frame); }
+  void operator()(AVPacket* packet) const { av_packet_free(&packet); }
+  void operator()(AVCodecContext* codec) const { avcodec_free_context(&codec); }
+  void operator()(SwsContext* scaler) const { sws_freeContext(scaler); }
+};
+using FramePtr = std::unique_ptr<AVFrame, FfmpegDelete>;
+using PacketPtr = std::unique_ptr<AVPacket, FfmpegDelete>;
+using CodecPtr = std::unique_ptr<AVCodecContext, FfmpegDelete>;
+using ScalerPtr = std::unique_ptr<SwsContext, FfmpegDelete>;
+
+struct InputDelete {
+  void operator()(AVFormatContext* container) const { avformat_close_input(&container); }
+};
+using InputPtr = std::unique_ptr<AVFormatContext, InputDelete>;
+
+template <class T>
+T* NotNull(T* pointer) {
+  if (!pointer) throw std::bad_alloc();
+  return pointer;
+}
+inline FramePtr NewFrame() {
+  return FramePtr(NotNull(av_frame_alloc()));
+}
+inline PacketPtr NewPacket() {
+  return PacketPtr(NotNull(av_packet_alloc()));
+}
+
+inline std::string ErrorText(int error) {
+  char text[AV_ERROR_MAX_STRING_SIZE] = {};
+  av_strerror(error, text, sizeof text);
+  return text;
+}
+
+inline AVRational ToRational(Ratio ratio) {
+  int num = 1;
+  int den = 1;
+  av_reduce(&num, &den, ratio.num, ratio.den, INT32_MAX);
+  return {num, den};
+}
+
+inline Ratio ToRatio(AVRational rational) {
+  return {rational.num, rational.den};
+}
+
+}  // namespace calmframe::media

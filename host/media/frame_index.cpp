@@ -1,0 +1,271 @@
+#include "host/media/frame_index.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstdlib>
+#include <cstring>
+
+namespace calmframe::media {
+namespace {
+
+constexpr int kStartsTried = 3;  // keyframes to try before decoding from the start
+
+// How far from its keyframe's number a frame with the same time stamp may stand, see NumberOf.
+constexpr std::size_t kReach = 512;
+
+std::int64_t OwnTime(const AVFrame& frame) {
+  return frame.pts != AV_NOPTS_VALUE ? frame.pts : frame.pkt_dts;
+}
+
+int ShownRotation(const AVStream& stream) {
+  const auto* matrix = reinterpret_cast<const std::int32_t*>(
+      av_stream_get_side_data(&stream, AV_PKT_DATA_DISPLAYMATRIX, nullptr));
+  if (!matrix) return 0;
+  const double determinant = double{1} * matrix[0] * matrix[4] - double{1} * matrix[1] * matrix[3];
+  if (!(determinant > 0)) return 0;  // mirrored: shown as stored
+  const double counterclockwise = av_display_rotation_get(matrix);
+  if (!std::isfinite(counterclockwise)) return 0;
+  const int quarters = static_cast<int>(std::lround(-counterclockwise / 90));
+  return ((quarters % 4) + 4) % 4 * 90;
+}
+
+AVRational FrameRate(const AVStream& stream, const std::vector<FrameTime>& times) {
+  const std::int64_t ticks = times.back().pts + times.back().duration - times.front().pts;
+  AVRational measured{25, 1};
+  av_reduce(&measured.num, &measured.den,
+            static_cast<std::int64_t>(times.size()) * stream.time_base.den,
+            ticks * stream.time_base.num, 1 << 30);
+  const auto near_measured = [&](AVRational rate, double tolerance) {
+    return rate.num > 0 && rate.den > 0 &&
+           std::abs(av_q2d(rate) / av_q2d(measured) - 1) < tolerance;
+  };
+  // The container's round figure, unless the frames themselves say otherwise.
+  if (near_measured(stream.r_frame_rate, 0.0002)) return stream.r_frame_rate;
+  if (near_measured(stream.avg_frame_rate, 0.005)) return stream.avg_frame_rate;
+  return measured;
+}
+
+void RepairTimes(const AVStream& stream, bool fields, std::vector<FrameTime>& times) {
+  std::int64_t nominal = 1;
+  if (stream.avg_frame_rate.num > 0 && stream.avg_frame_rate.den > 0) {
+    nominal = std::max<std::int64_t>(
+        av_rescale_q(1, av_inv_q(stream.avg_frame_rate), stream.time_base), 1);
+  }
+  for (std::size_t i = 0; i < times.size(); ++i) {
+    std::int64_t& pts = times[i].pts;
+    if (i == 0) {
+      if (pts == AV_NOPTS_VALUE) pts = 0;
+    } else if (pts == AV_NOPTS_VALUE) {
+      pts = times[i - 1].pts + nominal;
+    } else {
+      pts = std::max(pts, times[i - 1].pts + 1);
+    }
+  }
+  // A packet's own duration belongs to decoding order, so it serves for the last frame alone; that
+  // of a field-coded frame is one field's.
+  for (std::size_t i = 0; i + 1 < times.size(); ++i) {
+    times[i].duration = times[i + 1].pts - times[i].pts;
+  }
+  FrameTime& last = times.back();
+  if (fields || last.duration <= 0) {
+    last.duration = times.size() > 1 ? times[times.size() - 2].duration : nominal;
+  }
+}
+
+// Frames that the container promises, 0 if it doesn't say.
+std::int64_t PromisedFrames(const Decoder& decoder) {
+  AVStream* stream = decoder.container().streams[decoder.stream().index];
+  if (!std::strstr(decoder.container().iformat->name, "mov")) return stream->nb_frames;
+  std::int64_t promised = 0;
+  for (int i = 0; i < avformat_index_get_entries_count(stream); ++i) {
+    const AVIndexEntry* entry = avformat_index_get_entry(stream, i);
+    if (!(entry->flags & AVINDEX_DISCARD_FRAME)) ++promised;
+  }
+  return promised;
+}
+
+std::string DamageLine(const Decoder& decoder, std::size_t frames) {
+  const std::int64_t promised = PromisedFrames(decoder);
+  const auto count = static_cast<std::int64_t>(frames);
+  // Packed streams promise a frame or two more than they hold.
+  const bool fewer = count + 2 < promised ||
+                     (count < promised && std::strstr(decoder.container().iformat->name, "mov"));
+  if (fewer) {
+    return "damaged or cut short, " + std::to_string(count) + " of " + std::to_string(promised) +
+           " frames decode";
+  }
+  if (decoder.damage() > 0) {
+    return "damaged in " + std::to_string(decoder.damage()) + " places, " + std::to_string(count) +
+           " frames decode";
+  }
+  const AVFormatContext& container = decoder.container();
+  if (container.duration > 0 && container.start_time != AV_NOPTS_VALUE &&
+      container.duration_estimation_method == AVFMT_DURATION_FROM_STREAM &&
+      decoder.last_time() + AV_TIME_BASE / 2 < container.start_time + container.duration) {
+    return "cut short, " + std::to_string(count) + " frames decode";
+  }
+  return {};
+}
+
+}  // namespace
+
+std::uint64_t Fingerprint(const AVFrame& frame) {
+  constexpr std::uint64_t kPrime = 0x9E3779B97F4A7C15u;
+  std::uint64_t lanes[4] = {1, 2, 3, 4};
+  const auto format = static_cast<AVPixelFormat>(frame.format);
+  const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(format);
+  for (int plane = 0; plane < 4 && frame.data[plane]; ++plane) {
+    const int bytes = av_image_get_linesize(format, frame.width, plane);
+    if (bytes <= 0) break;
+    const bool chroma = (plane == 1 || plane == 2) && layout;
+    const int rows = chroma ? AV_CEIL_RSHIFT(frame.height, layout->log2_chroma_h) : frame.height;
+    for (int y = 0; y < rows; ++y) {
+      const std::uint8_t* row = frame.data[plane] + std::ptrdiff_t{y} * frame.linesize[plane];
+      int x = 0;
+      for (; x + 32 <= bytes; x += 32) {
+        for (int lane = 0; lane < 4; ++lane) {
+          std::uint64_t word;
+          std::memcpy(&word, row + x + 8 * lane, 8);
+          lanes[lane] = (lanes[lane] ^ word) * kPrime;
+          lanes[lane] ^= lanes[lane] >> 32;
+        }
+      }
+      for (; x < bytes; ++x) lanes[0] = (lanes[0] ^ row[x]) * kPrime;
+    }
+    if (layout && (layout->flags & AV_PIX_FMT_FLAG_PAL)) break;
+  }
+  std::uint64_t hash = 0;
+  for (const std::uint64_t lane : lanes) hash = (hash ^ lane ^ (lane >> 29)) * kPrime;
+  return hash;
+}
+
+FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info) {
+  FrameIndex index;
+  const AVStream& stream = decoder.stream();
+  std::size_t top_first = 0;
+  std::size_t bottom_first = 0;
+  FramePtr first;
+  AVRational aspect{0, 1};
+  while (FramePtr frame = decoder.Next()) {
+    index.push_back({OwnTime(*frame), Fingerprint(*frame), frame->key_frame != 0});
+    info.times.push_back({frame->best_effort_timestamp, frame->pkt_duration});
+    if (frame->interlaced_frame) ++(frame->top_field_first ? top_first : bottom_first);
+    if (!first) {
+      aspect = av_guess_sample_aspect_ratio(const_cast<AVFormatContext*>(&decoder.container()),
+                                            const_cast<AVStream*>(&stream), frame.get());
+      first = std::move(frame);
+    }
+  }
+  if (!first) {
+    throw Failure(Failure::Side::input, path + ": no frame of its video stream decodes");
+  }
+  const bool interlaced = 2 * (top_first + bottom_first) > index.size();
+  RepairTimes(stream, interlaced, info.times);
+
+  info.path = path;
+  info.stream = stream.index;
+  info.frame_count = index.size();
+  info.time_base = ToRatio(stream.time_base);
+  info.frame_rate = ToRatio(FrameRate(stream, info.times));
+  info.codec = avcodec_get_name(stream.codecpar->codec_id);
+  info.rotation = ShownRotation(stream);
+  info.width = first->width;
+  info.height = first->height;
+  if (aspect.num <= 0 || aspect.den <= 0) aspect = {1, 1};
+  if (info.rotation % 180 != 0) {
+    std::swap(info.width, info.height);
+    aspect = av_inv_q(aspect);
+  } else if (interlaced) {
+    info.field_order = top_first >= bottom_first ? FieldOrder::top_first : FieldOrder::bottom_first;
+  }
+  info.pixel_aspect = ToRatio(aspect);
+  const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(static_cast<AVPixelFormat>(first->format));
+  if (layout) {
+    info.bit_depth =
+        layout->flags & AV_PIX_FMT_FLAG_PAL ? 8 : std::clamp(layout->comp[0].depth, 8, 16);
+    info.has_alpha = (layout->flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
+  }
+  info.colour = {first->color_primaries, first->color_trc, first->colorspace, first->color_range,
+                 first->chroma_location};
+  const std::string damage = DamageLine(decoder, index.size());
+  if (!damage.empty()) info.warning = path + ": " + damage;
+  return index;
+}
+
+std::vector<std::size_t> FrameFinder::StartsFor(std::size_t frame) const {
+  std::vector<std::size_t> starts;
+  for (std::size_t i = frame + 1; i-- > 1 && starts.size() < kStartsTried;) {
+    if (index_[i].keyframe && index_[i].pts != AV_NOPTS_VALUE) starts.push_back(i);
+  }
+  return starts;
+}
+
+std::optional<std::size_t> FrameFinder::NumberOf(const AVFrame& frame,
+                                                 std::size_t near_frame) const {
+  const std::int64_t pts = OwnTime(frame);
+  if (pts == AV_NOPTS_VALUE) return {};
+  const std::size_t begin = near_frame - std::min(near_frame, kReach);
+  const std::size_t end = std::min(near_frame + kReach, index_.size());
+  std::optional<std::size_t> found;
+  const std::uint64_t fingerprint = Fingerprint(frame);
+  for (std::size_t i = begin; i < end; ++i) {
+    if (index_[i].pts != pts || index_[i].fingerprint != fingerprint) continue;
+    if (found) return {};
+    found = i;
+  }
+  return found;
+}
+
+bool FrameFinder::SeekTo(std::size_t start, std::size_t frame, const std::atomic<bool>& stop) {
+  next_.reset();
+  pending_.reset();
+  if (!decoder_.Seek(index_[start].pts)) return false;
+  verified_ = false;
+  for (std::size_t skipped = 0; skipped < kReach && !stop; ++skipped) {
+    FramePtr decoded = decoder_.Next();
+    if (!decoded) return false;
+    const std::optional<std::size_t> number = NumberOf(*decoded, start);
+    if (!number) continue;
+    if (*number > frame) return false;
+    next_ = number;
+    pending_ = std::move(decoded);
+    return true;
+  }
+  return false;
+}
+
+FramePtr FrameFinder::Forward(std::size_t frame, const std::atomic<bool>& stop) {
+  while (!stop) {
+    FramePtr decoded = pending_ ? std::move(pending_) : decoder_.Next();
+    if (!decoded || *next_ >= index_.size() ||
+        (!verified_ && Fingerprint(*decoded) != index_[*next_].fingerprint)) {
+      next_.reset();
+      return nullptr;
+    }
+    if ((*next_)++ == frame) return decoded;
+  }
+  return nullptr;
+}
+
+FramePtr FrameFinder::Get(std::size_t frame, const std::atomic<bool>& stop) {
+  const std::vector<std::size_t> starts = StartsFor(frame);
+  if (next_ && *next_ <= frame && (starts.empty() || starts.front() <= *next_)) {
+    if (FramePtr found = Forward(frame, stop)) return found;
+  }
+  for (const std::size_t start : starts) {
+    if (stop) return nullptr;
+    if (!SeekTo(start, frame, stop)) continue;
+    if (FramePtr found = Forward(frame, stop)) return found;
+  }
+  if (stop) return nullptr;
+  decoder_.Rewind();
+  next_ = 0;
+  pending_.reset();
+  verified_ = true;
+  if (FramePtr found = Forward(frame, stop)) return found;
+  if (stop) return nullptr;
+  throw Failure(Failure::Side::input,
+                path_ + ": frame " + std::to_string(frame) + " no longer decodes");
+}
+
+}  // namespace calmframe::media

@@ -1,0 +1,58 @@
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "host/media/decoder.h"
+
+namespace calmframe::media {
+
+// Hash of a frame's pixels, padding left out. Tells whether decoding from a seek point gave the
+// frame that decoding from the start gives.
+std::uint64_t Fingerprint(const AVFrame& frame);
+
+struct IndexEntry {
+  std::int64_t pts = AV_NOPTS_VALUE;  // as decoded, before any repair
+  std::uint64_t fingerprint = 0;
+  bool keyframe = false;
+};
+using FrameIndex = std::vector<IndexEntry>;
+
+// Decodes everything once: a container's own count and times are promises, this is what is there.
+// Fills info, with a warning where the stream is damaged. Throws Failure (input) if no frame
+// decodes.
+FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info);
+
+// Frames by number. Ascending numbers decode on; others decode from the nearest keyframe whose
+// frames prove, by time stamp and fingerprint, to be those of the index, or else from the start.
+class FrameFinder {
+ public:
+  // `index` must outlive this.
+  FrameFinder(const std::string& path, const FrameIndex& index)
+      : path_(path), decoder_(path), index_(index) {}
+
+  // Null if `stop` became true. Throws Failure (input) if the frame no longer decodes.
+  FramePtr Get(std::size_t frame, const std::atomic<bool>& stop);
+
+  // Number of the frame that comes without seeking.
+  std::optional<std::size_t> next() const { return next_; }
+
+ private:
+  std::vector<std::size_t> StartsFor(std::size_t frame) const;
+  bool SeekTo(std::size_t start, std::size_t frame, const std::atomic<bool>& stop);
+  FramePtr Forward(std::size_t frame, const std::atomic<bool>& stop);
+  std::optional<std::size_t> NumberOf(const AVFrame& frame, std::size_t near_frame) const;
+
+  const std::string path_;
+  Decoder decoder_;
+  const FrameIndex& index_;
+  std::optional<std::size_t> next_ = 0;
+  FramePtr pending_;      // frame *next_ when it is decoded already
+  bool verified_ = true;  // decoding from the start; otherwise each frame is compared to the index
+};
+
+}  // namespace calmframe::media

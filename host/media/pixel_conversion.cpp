@@ -1,0 +1,476 @@
+#include "host/media/pixel_conversion.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+#include <thread>
+#include <type_traits>
+
+namespace calmframe::media {
+namespace {
+
+constexpr int kTurnTile = 16;  // pixels; two tiles of the widest pixel fit in the first-level cache
+
+// Luma weights, ITU-R BT.601, BT.709, BT.2020 and older ones.
+struct LumaWeights {
+  double red, blue;
+};
+LumaWeights WeightsOf(AVColorSpace matrix) {
+  switch (matrix) {
+    case AVCOL_SPC_BT709:
+      return {0.2126, 0.0722};
+    case AVCOL_SPC_FCC:
+      return {0.30, 0.11};
+    case AVCOL_SPC_SMPTE240M:
+      return {0.212, 0.087};
+    case AVCOL_SPC_BT2020_NCL:
+      return {0.2627, 0.0593};
+    default:
+      return {0.299, 0.114};
+  }
+}
+
+int SwscaleMatrix(AVColorSpace matrix) {
+  switch (matrix) {
+    case AVCOL_SPC_BT709:
+      return SWS_CS_ITU709;
+    case AVCOL_SPC_FCC:
+      return SWS_CS_FCC;
+    case AVCOL_SPC_SMPTE240M:
+      return SWS_CS_SMPTE240M;
+    case AVCOL_SPC_BT2020_NCL:
+      return SWS_CS_BT2020;
+    default:
+      return SWS_CS_ITU601;
+  }
+}
+
+const AVPixFmtDescriptor& LayoutOf(const AVFrame& frame) {
+  return *NotNull(av_pix_fmt_desc_get(static_cast<AVPixelFormat>(frame.format)));
+}
+
+bool IsYuv(const AVPixFmtDescriptor& layout) {
+  return layout.nb_components >= 3 &&
+         !(layout.flags & (AV_PIX_FMT_FLAG_RGB | AV_PIX_FMT_FLAG_PAL | AV_PIX_FMT_FLAG_FLOAT |
+                           AV_PIX_FMT_FLAG_BAYER)) &&
+         std::strncmp(layout.name, "xyz", 3) != 0;
+}
+
+FramePtr NewPicture(int format, int width, int height) {
+  FramePtr frame = NewFrame();
+  frame->format = format;
+  frame->width = width;
+  frame->height = height;
+  if (av_frame_get_buffer(frame.get(), 0) < 0) throw std::bad_alloc();
+  return frame;
+}
+
+AVFrame& Reuse(FramePtr& frame, int format, int width, int height) {
+  if (!frame || frame->format != format || frame->width != width || frame->height != height) {
+    frame = NewPicture(format, width, height);
+  }
+  return *frame;
+}
+
+// Every second row of a frame, sharing its memory.
+FramePtr FieldOf(const AVFrame& frame, int parity) {
+  FramePtr field = NewFrame();
+  if (av_frame_ref(field.get(), &frame) < 0) throw std::bad_alloc();
+  field->height /= 2;
+  for (int plane = 0; plane < 4 && field->data[plane]; ++plane) {
+    field->data[plane] += std::ptrdiff_t{parity} * field->linesize[plane];
+    field->linesize[plane] *= 2;
+  }
+  return field;
+}
+
+template <class Pixel>
+Pixel* Row(Pixel* pixels, std::ptrdiff_t row_bytes, int y) {
+  using Byte = std::conditional_t<std::is_const_v<Pixel>, const std::uint8_t, std::uint8_t>;
+  return reinterpret_cast<Pixel*>(reinterpret_cast<Byte*>(pixels) + y * row_bytes);
+}
+
+template <class Pixel>
+Pixel FromUnit(float alpha, float red, float green, float blue) {
+  const auto unit = [](float value) { return std::min(std::max(value, 0.0f), 1.0f); };
+  if constexpr (std::is_same_v<Pixel, HX_PixelFloat>) {
+    return {unit(alpha), unit(red), unit(green), unit(blue)};
+  } else {
+    constexpr float kTop = std::is_same_v<Pixel, HX_Pixel8> ? 255.0f : 32768.0f;
+    using Value = decltype(Pixel::alpha);
+    const auto value = [&](float v) { return static_cast<Value>(unit(v) * kTop + 0.5f); };
+    return {value(alpha), value(red), value(green), value(blue)};
+  }
+}
+
+template <class Pixel>
+constexpr float kUnit = std::is_same_v<Pixel, HX_Pixel8>    ? 1.0f / 255
+                        : std::is_same_v<Pixel, HX_Pixel16> ? 1.0f / 32768
+                                                            : 1.0f;
+
+// Scale and offset of YUV in 16 bits: code words of `depth` bits shifted up.
+struct CodeScale {
+  CodeScale(bool full_range, int depth)
+      : top(static_cast<float>(((1 << depth) - 1) << (16 - depth))),
+        luma(full_range ? top : 219.0f * 256),
+        chroma(full_range ? top : 224.0f * 256),
+        black(full_range ? 0.0f : 16.0f * 256) {}
+  float top, luma, chroma, black;
+};
+
+template <class Pixel>
+void FromYuv16(const AVFrame& yuv, const ColourModel& model, int depth, bool alpha, Pixel* pixels,
+               std::ptrdiff_t row_bytes) {
+  const LumaWeights weights = WeightsOf(model.matrix);
+  const CodeScale scale(model.full_range, depth);
+  const auto red_v = static_cast<float>(2 * (1 - weights.red));
+  const auto blue_u = static_cast<float>(2 * (1 - weights.blue));
+  const double green = 1 - weights.red - weights.blue;
+  const auto green_v = static_cast<float>(weights.red / green) * red_v;
+  const auto green_u = static_cast<float>(weights.blue / green) * blue_u;
+  for (int row = 0; row < yuv.height; ++row) {
+    const auto plane = [&](int p) {
+      return reinterpret_cast<const std::uint16_t*>(yuv.data[p] +
+                                                    std::ptrdiff_t{row} * yuv.linesize[p]);
+    };
+    const std::uint16_t* luma = plane(0);
+    const std::uint16_t* cb = plane(1);
+    const std::uint16_t* cr = plane(2);
+    const std::uint16_t* opacity = alpha ? plane(3) : nullptr;
+    Pixel* out = Row(pixels, row_bytes, row);
+    for (int x = 0; x < yuv.width; ++x) {
+      const float y = (static_cast<float>(luma[x]) - scale.black) / scale.luma;
+      const float u = (static_cast<float>(cb[x]) - 32768.0f) / scale.chroma;
+      const float v = (static_cast<float>(cr[x]) - 32768.0f) / scale.chroma;
+      out[x] = FromUnit<Pixel>(opacity ? static_cast<float>(opacity[x]) / scale.top : 1.0f,
+                               y + red_v * v, y - green_u * u - green_v * v, y + blue_u * u);
+    }
+  }
+}
+
+// RGB, palette and grey of any integer depth, read component by component, exactly.
+template <class Pixel>
+void FromComponents(const AVFrame& frame, bool full_range, Pixel* pixels,
+                    std::ptrdiff_t row_bytes) {
+  const AVPixFmtDescriptor& layout = LayoutOf(frame);
+  const bool palette = (layout.flags & AV_PIX_FMT_FLAG_PAL) != 0;
+  const bool grey = !palette && layout.nb_components < 3;
+  const bool alpha = (layout.flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
+  const std::uint8_t* data[4] = {frame.data[0], frame.data[1], frame.data[2], frame.data[3]};
+  std::vector<std::uint16_t> lines[4];
+  for (auto& line : lines) line.resize(frame.width);
+  float black = 0;
+  float scale[4] = {1, 1, 1, 1};
+  const int components = palette ? 4 : layout.nb_components;
+  for (int c = 0; c < components; ++c) {
+    const int depth = palette ? 8 : layout.comp[c].depth;
+    scale[c] = 1.0f / static_cast<float>((1 << depth) - 1);
+    if (grey && c == 0 && !full_range) {
+      black = static_cast<float>(16 << (depth - 8));
+      scale[c] = 1.0f / static_cast<float>(219 << (depth - 8));
+    }
+  }
+  for (int y = 0; y < frame.height; ++y) {
+    for (int c = 0; c < components; ++c) {
+      av_read_image_line2(lines[c].data(), data, frame.linesize, &layout, 0, y, c, frame.width,
+                          palette, 2);
+    }
+    Pixel* out = Row(pixels, row_bytes, y);
+    const int opacity = grey ? 1 : 3;
+    for (int x = 0; x < frame.width; ++x) {
+      float rgb[3];
+      for (int c = 0; c < 3; ++c) {
+        const int from = grey ? 0 : c;
+        rgb[c] = (static_cast<float>(lines[from][x]) - black) * scale[from];
+      }
+      out[x] =
+          FromUnit<Pixel>(alpha ? static_cast<float>(lines[opacity][x]) * scale[opacity] : 1.0f,
+                          rgb[0], rgb[1], rgb[2]);
+    }
+  }
+}
+
+void FromPlanes8(const AVFrame& gbr, bool alpha, HX_Pixel8* pixels, std::ptrdiff_t row_bytes) {
+  for (int y = 0; y < gbr.height; ++y) {
+    const auto plane = [&](int p) { return gbr.data[p] + std::ptrdiff_t{y} * gbr.linesize[p]; };
+    const std::uint8_t* green = plane(0);
+    const std::uint8_t* blue = plane(1);
+    const std::uint8_t* red = plane(2);
+    HX_Pixel8* out = Row(pixels, row_bytes, y);
+    if (alpha) {
+      const std::uint8_t* opacity = plane(3);
+      for (int x = 0; x < gbr.width; ++x) out[x] = {opacity[x], red[x], green[x], blue[x]};
+    } else {
+      for (int x = 0; x < gbr.width; ++x) out[x] = {255, red[x], green[x], blue[x]};
+    }
+  }
+}
+
+// Rotates by quarters clockwise; width, height: of `stored`.
+template <class Pixel>
+void Turn(const Pixel* stored, int width, int height, int rotation, Pixel* pixels,
+          std::ptrdiff_t row_bytes) {
+  for (int top = 0; top < height; top += kTurnTile) {
+    for (int left = 0; left < width; left += kTurnTile) {
+      for (int y = top; y < std::min(top + kTurnTile, height); ++y) {
+        for (int x = left; x < std::min(left + kTurnTile, width); ++x) {
+          const int to_x = rotation == 90 ? height - 1 - y : rotation == 180 ? width - 1 - x : y;
+          const int to_y = rotation == 90 ? x : rotation == 180 ? height - 1 - y : width - 1 - x;
+          Row(pixels, row_bytes, to_y)[to_x] = stored[std::ptrdiff_t{y} * width + x];
+        }
+      }
+    }
+  }
+}
+
+}  // namespace
+
+ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int height) {
+  ColourModel model;
+  model.matrix = static_cast<AVColorSpace>(tags.matrix);
+  switch (model.matrix) {
+    case AVCOL_SPC_BT709:
+    case AVCOL_SPC_FCC:
+    case AVCOL_SPC_BT470BG:
+    case AVCOL_SPC_SMPTE170M:
+    case AVCOL_SPC_SMPTE240M:
+    case AVCOL_SPC_BT2020_NCL:
+      break;
+    case AVCOL_SPC_BT2020_CL:
+    case AVCOL_SPC_ICTCP:
+      model.matrix = AVCOL_SPC_BT2020_NCL;
+      break;
+    default:
+      model.matrix = width >= 1280 || height >= 720 ? AVCOL_SPC_BT709 : AVCOL_SPC_SMPTE170M;
+  }
+  const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(format);
+  const bool jpeg = layout && std::strncmp(layout->name, "yuvj", 4) == 0;
+  const bool grey = layout && layout->nb_components < 3;
+  model.full_range =
+      jpeg || tags.range == AVCOL_RANGE_JPEG || (grey && tags.range == AVCOL_RANGE_UNSPECIFIED);
+  model.chroma = static_cast<AVChromaLocation>(tags.chroma_location);
+  if (model.chroma == AVCHROMA_LOC_UNSPECIFIED) {
+    model.chroma = jpeg ? AVCHROMA_LOC_CENTER : AVCHROMA_LOC_LEFT;
+  }
+  return model;
+}
+
+void Scaler::Scale(const AVFrame& from, AVFrame& to, const ColourModel& model) {
+  const bool subsampled = LayoutOf(from).log2_chroma_h == 1 || LayoutOf(to).log2_chroma_h == 1;
+  if (!model.fields || !subsampled || from.height != to.height || from.height % 4 != 0) {
+    ScalePart(from, to, model, 0);
+    return;
+  }
+  for (int parity = 0; parity < 2; ++parity) {
+    const FramePtr from_field = FieldOf(from, parity);
+    const FramePtr to_field = FieldOf(to, parity);
+    ScalePart(*from_field, *to_field, model, 1 + parity);
+  }
+}
+
+void Scaler::ScalePart(const AVFrame& from, AVFrame& to, const ColourModel& model, int part) {
+  const Key key{from.width, from.height,  from.format,  to.width,        to.height,
+                to.format,  model.matrix, model.chroma, model.full_range};
+  ScalerPtr& context = contexts_[part];
+  if (!context || keys_[part] != key) {
+    context.reset(NotNull(sws_alloc_context()));
+    const auto set = [&](const char* name, std::int64_t value) {
+      av_opt_set_int(context.get(), name, value, 0);
+    };
+    set("srcw", from.width);
+    set("srch", from.height);
+    set("src_format", from.format);
+    set("dstw", to.width);
+    set("dsth", to.height);
+    set("dst_format", to.format);
+    set("sws_flags", SWS_BICUBIC | SWS_ACCURATE_RND | SWS_FULL_CHR_H_INT | SWS_FULL_CHR_H_INP);
+    // Formats below 8 bits are dithered from row to row, which bands in parallel would break.
+    const unsigned processors = std::clamp(std::thread::hardware_concurrency(), 1u, 4u);
+    set("threads", LayoutOf(to).comp[0].depth < 8 ? 1 : processors);
+    const auto position = [&](const char* across, const char* down, const AVFrame& frame) {
+      const AVPixFmtDescriptor& layout = LayoutOf(frame);
+      const bool centred = model.chroma == AVCHROMA_LOC_CENTER ||
+                           model.chroma == AVCHROMA_LOC_TOP || model.chroma == AVCHROMA_LOC_BOTTOM;
+      const bool top = model.chroma == AVCHROMA_LOC_TOPLEFT || model.chroma == AVCHROMA_LOC_TOP;
+      // In 1/256 of a luma sample.
+      if (layout.log2_chroma_w == 1) set(across, centred ? 128 : 0);
+      if (layout.log2_chroma_h == 1) set(down, part == 1 ? 64 : part == 2 ? 192 : top ? 0 : 128);
+    };
+    position("src_h_chr_pos", "src_v_chr_pos", from);
+    position("dst_h_chr_pos", "dst_v_chr_pos", to);
+    const int* coefficients = sws_getCoefficients(SwscaleMatrix(model.matrix));
+    const bool from_full =
+        IsYuv(LayoutOf(from)) || LayoutOf(from).nb_components < 3 ? model.full_range : false;
+    const bool to_full =
+        IsYuv(LayoutOf(to)) || LayoutOf(to).nb_components < 3 ? model.full_range : true;
+    const auto set_colours = [&] {
+      sws_setColorspaceDetails(context.get(), coefficients, from_full, coefficients, to_full, 0,
+                               1 << 16, 1 << 16);
+    };
+    set_colours();  // decides which converters are chosen
+    if (sws_init_context(context.get(), nullptr, nullptr) < 0) {
+      context.reset();
+      throw std::runtime_error(std::string("no conversion from ") + LayoutOf(from).name + " to " +
+                               LayoutOf(to).name);
+    }
+    set_colours();  // some converters take their tables only now
+    keys_[part] = key;
+  }
+  if (sws_scale_frame(context.get(), &to, &from) < 0) throw std::bad_alloc();
+}
+
+template <class Pixel>
+void FrameToPixels::ConvertStored(const AVFrame& frame, Pixel* pixels, std::ptrdiff_t row_bytes) {
+  const AVPixFmtDescriptor& layout = LayoutOf(frame);
+  ColourModel model = ModelOf({frame.color_primaries, frame.color_trc, frame.colorspace,
+                               frame.color_range, frame.chroma_location},
+                              static_cast<AVPixelFormat>(frame.format), info_.width, info_.height);
+  model.fields = frame.interlaced_frame != 0;
+  const bool alpha = (layout.flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
+  if (!IsYuv(layout)) {
+    const bool odd = (layout.flags & (AV_PIX_FMT_FLAG_FLOAT | AV_PIX_FMT_FLAG_BAYER)) ||
+                     std::strncmp(layout.name, "xyz", 3) == 0;
+    if (odd) {
+      AVFrame& rgb = Reuse(planes_, AV_PIX_FMT_RGBA64, frame.width, frame.height);
+      scaler_.Scale(frame, rgb, model);
+      FromComponents(rgb, true, pixels, row_bytes);
+    } else {
+      FromComponents(frame, model.full_range, pixels, row_bytes);
+    }
+  } else if constexpr (std::is_same_v<Pixel, HX_Pixel8>) {
+    AVFrame& planes =
+        Reuse(planes_, alpha ? AV_PIX_FMT_GBRAP : AV_PIX_FMT_GBRP, frame.width, frame.height);
+    scaler_.Scale(frame, planes, model);
+    FromPlanes8(planes, alpha, pixels, row_bytes);
+  } else {
+    AVFrame& planes = Reuse(planes_, alpha ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16,
+                            frame.width, frame.height);
+    scaler_.Scale(frame, planes, model);
+    FromYuv16(planes, model, layout.comp[0].depth, alpha, pixels, row_bytes);
+  }
+}
+
+template <class Pixel>
+void FrameToPixels::Convert(const AVFrame& frame, Pixel* pixels, std::ptrdiff_t row_bytes) {
+  const bool sideways = info_.rotation % 180 != 0;
+  const int width = sideways ? info_.height : info_.width;
+  const int height = sideways ? info_.width : info_.height;
+  const AVFrame* fitting = &frame;
+  if (frame.width != width || frame.height != height) {
+    // A stream may change its size on the way; the clip's is that of its first frame.
+    AVFrame& resized = Reuse(resized_, frame.format, width, height);
+    resizer_.Scale(frame, resized, ColourModel{});
+    av_frame_copy_props(&resized, &frame);
+    fitting = &resized;
+  }
+  if (info_.rotation == 0) {
+    ConvertStored(*fitting, pixels, row_bytes);
+    return;
+  }
+  turned_.resize(sizeof(Pixel) * static_cast<std::size_t>(width) * height);
+  auto* stored = reinterpret_cast<Pixel*>(turned_.data());
+  ConvertStored(*fitting, stored, static_cast<std::ptrdiff_t>(sizeof(Pixel)) * width);
+  Turn(stored, width, height, info_.rotation, pixels, row_bytes);
+}
+
+template <class Pixel>
+FramePtr PixelsToFrame::Convert(const Pixel* pixels, std::ptrdiff_t row_bytes) {
+  FramePtr frame = NewPicture(format_, width_, height_);
+  const AVPixFmtDescriptor& layout = LayoutOf(*frame);
+  const bool alpha = (layout.flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
+  const bool rgb = (layout.flags & AV_PIX_FMT_FLAG_RGB) != 0;
+  const auto opacity = [&](const Pixel& pixel) {
+    return alpha ? 1.0f : static_cast<float>(pixel.alpha) * kUnit<Pixel>;
+  };
+  if (rgb && layout.comp[0].depth >= 8 && layout.comp[0].depth <= 16) {
+    std::vector<std::uint16_t> line(width_);
+    for (int y = 0; y < height_; ++y) {
+      const Pixel* in = Row(pixels, row_bytes, y);
+      for (int c = 0; c < layout.nb_components; ++c) {
+        const auto top = static_cast<float>((1 << layout.comp[c].depth) - 1);
+        for (int x = 0; x < width_; ++x) {
+          const auto values = {in[x].red, in[x].green, in[x].blue, in[x].alpha};
+          const float value = static_cast<float>(values.begin()[c]) * kUnit<Pixel> *
+                              (c < 3 ? opacity(in[x]) : 1.0f);
+          line[x] = static_cast<std::uint16_t>(std::min(std::max(value, 0.0f), 1.0f) * top + 0.5f);
+        }
+        av_write_image_line2(line.data(), frame->data, frame->linesize, &layout, 0, y, c, width_,
+                             2);
+      }
+    }
+    return frame;
+  }
+  if (std::is_same_v<Pixel, HX_Pixel8> || rgb) {
+    AVFrame& argb = Reuse(planes_, AV_PIX_FMT_ARGB, width_, height_);
+    for (int y = 0; y < height_; ++y) {
+      const Pixel* in = Row(pixels, row_bytes, y);
+      auto* out = Row(reinterpret_cast<HX_Pixel8*>(argb.data[0]), argb.linesize[0], y);
+      if constexpr (std::is_same_v<Pixel, HX_Pixel8>) {
+        std::memcpy(out, in, sizeof(Pixel) * static_cast<std::size_t>(width_));
+        if (alpha) continue;
+        for (int x = 0; x < width_; ++x) {
+          const int a = out[x].alpha;
+          const auto over_black = [a](int value) {
+            return static_cast<std::uint8_t>((value * a + 127) / 255);
+          };
+          out[x] = {255, over_black(out[x].red), over_black(out[x].green), over_black(out[x].blue)};
+        }
+      } else {
+        for (int x = 0; x < width_; ++x) {
+          const float gain = opacity(in[x]) * kUnit<Pixel>;
+          out[x] = FromUnit<HX_Pixel8>(
+              static_cast<float>(in[x].alpha) * kUnit<Pixel>, static_cast<float>(in[x].red) * gain,
+              static_cast<float>(in[x].green) * gain, static_cast<float>(in[x].blue) * gain);
+        }
+      }
+    }
+    scaler_.Scale(argb, *frame, model_);
+    return frame;
+  }
+  AVFrame& yuv =
+      Reuse(planes_, alpha ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16, width_, height_);
+  const LumaWeights weights = WeightsOf(model_.matrix);
+  const auto kr = static_cast<float>(weights.red);
+  const auto kb = static_cast<float>(weights.blue);
+  const CodeScale scale(model_.full_range, std::min(layout.comp[0].depth, 16));
+  const auto code = [](float value) {
+    return static_cast<std::uint16_t>(std::min(std::max(value, 0.0f), 65535.0f) + 0.5f);
+  };
+  for (int row = 0; row < height_; ++row) {
+    const Pixel* in = Row(pixels, row_bytes, row);
+    const auto plane = [&](int p) {
+      return reinterpret_cast<std::uint16_t*>(yuv.data[p] + std::ptrdiff_t{row} * yuv.linesize[p]);
+    };
+    std::uint16_t* luma = plane(0);
+    std::uint16_t* cb = plane(1);
+    std::uint16_t* cr = plane(2);
+    for (int x = 0; x < width_; ++x) {
+      const float gain = opacity(in[x]) * kUnit<Pixel>;
+      const auto unit = [gain](auto value) {
+        return std::min(std::max(static_cast<float>(value) * gain, 0.0f), 1.0f);
+      };
+      const float red = unit(in[x].red);
+      const float blue = unit(in[x].blue);
+      const float y = kr * red + (1 - kr - kb) * unit(in[x].green) + kb * blue;
+      luma[x] = code(scale.black + scale.luma * y);
+      cb[x] = code(32768.0f + scale.chroma * (blue - y) / (2 * (1 - kb)));
+      cr[x] = code(32768.0f + scale.chroma * (red - y) / (2 * (1 - kr)));
+    }
+    if (alpha) {
+      for (int x = 0; x < width_; ++x) {
+        plane(3)[x] = code(static_cast<float>(in[x].alpha) * kUnit<Pixel> * scale.top);
+      }
+    }
+  }
+  scaler_.Scale(yuv, *frame, model_);
+  return frame;
+}
+
+template void FrameToPixels::Convert(const AVFrame&, HX_Pixel8*, std::ptrdiff_t);
+template void FrameToPixels::Convert(const AVFrame&, HX_Pixel16*, std::ptrdiff_t);
+template void FrameToPixels::Convert(const AVFrame&, HX_PixelFloat*, std::ptrdiff_t);
+template FramePtr PixelsToFrame::Convert(const HX_Pixel8*, std::ptrdiff_t);
+template FramePtr PixelsToFrame::Convert(const HX_Pixel16*, std::ptrdiff_t);
+template FramePtr PixelsToFrame::Convert(const HX_PixelFloat*, std::ptrdiff_t);
+
+}  // namespace calmframe::media

@@ -1,0 +1,168 @@
+#include "host/media/stream_copy.h"
+
+#include <algorithm>
+#include <cstring>
+
+#include "host/media/decoder.h"
+
+namespace calmframe::media {
+namespace {
+
+std::uint32_t TagFor(const AVOutputFormat& format, const AVCodecParameters& parameters) {
+  unsigned tag = 0;
+  const bool keeps =
+      !format.codec_tag ||
+      av_codec_get_id(format.codec_tag, parameters.codec_tag) == parameters.codec_id ||
+      !av_codec_get_tag2(format.codec_tag, parameters.codec_id, &tag);
+  return keeps ? parameters.codec_tag : 0;
+}
+
+bool AddStream(const AVStream& from, AVFormatContext& output) {
+  AVStream* to = NotNull(avformat_new_stream(&output, nullptr));
+  if (avcodec_parameters_copy(to->codecpar, from.codecpar) < 0) return false;
+  to->codecpar->codec_tag = TagFor(*output.oformat, *from.codecpar);
+  to->time_base = from.time_base;
+  to->disposition = from.disposition;
+  to->sample_aspect_ratio = from.sample_aspect_ratio;
+  to->avg_frame_rate = from.avg_frame_rate;
+  to->r_frame_rate = from.r_frame_rate;
+  av_dict_copy(&to->metadata, from.metadata, 0);
+  for (int i = 0; i < from.nb_side_data; ++i) {
+    const AVPacketSideData& data = from.side_data[i];
+    std::uint8_t* copy = av_stream_new_side_data(to, data.type, data.size);
+    if (copy) std::memcpy(copy, data.data, data.size);
+  }
+  return true;
+}
+
+// Muxers say what they take only by writing a header, so one is written into memory.
+bool Takes(const AVOutputFormat& format, const AVStream& video, const AVStream& stream) {
+  AVFormatContext* trial = nullptr;
+  if (avformat_alloc_output_context2(&trial, &format, nullptr, nullptr) < 0) return false;
+  bool taken =
+      AddStream(video, *trial) && AddStream(stream, *trial) && avio_open_dyn_buf(&trial->pb) >= 0;
+  if (taken) {
+    taken = avformat_write_header(trial, nullptr) >= 0;
+    std::uint8_t* bytes = nullptr;
+    avio_close_dyn_buf(trial->pb, &bytes);
+    av_free(bytes);
+    trial->pb = nullptr;
+  }
+  avformat_free_context(trial);
+  return taken;
+}
+
+}  // namespace
+
+StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVFormatContext& output,
+                       std::vector<std::string>& warnings)
+    : input_(OpenInput(source.path)), output_(output) {
+  // A broadcast clock starts anywhere; in another kind of file the clip starts at 0.
+  const bool broadcast = (input_->iformat->flags & AVFMT_TS_DISCONT) != 0;
+  if (broadcast && !(std::strcmp(output.oformat->name, "mpegts") == 0) &&
+      input_->start_time != AV_NOPTS_VALUE) {
+    offset_ = input_->start_time;
+  }
+  for (unsigned i = 0; i < input_->nb_streams; ++i) {
+    AVStream& from = *input_->streams[i];
+    if (static_cast<int>(i) == source.stream) {
+      CopyVideoProperties(from, *output.streams[0]);
+      from.discard = AVDISCARD_ALL;
+      continue;
+    }
+    const AVCodecParameters& parameters = *from.codecpar;
+    if (avformat_query_codec(output.oformat, parameters.codec_id, FF_COMPLIANCE_NORMAL) == 0 ||
+        !Takes(*output.oformat, *output.streams[0], from) || !AddStream(from, output)) {
+      const char* type = av_get_media_type_string(parameters.codec_type);
+      warnings.push_back(shown + ": a " + output.oformat->name + " file can't hold stream " +
+                         std::to_string(i) + " (" + (type ? type : "unknown") + ", " +
+                         avcodec_get_name(parameters.codec_id) + "), left out");
+      from.discard = AVDISCARD_ALL;
+      continue;
+    }
+    to_[static_cast<int>(i)] = static_cast<int>(output.nb_streams) - 1;
+  }
+  av_dict_copy(&output.metadata, input_->metadata, 0);
+  for (const char* key : {"major_brand", "minor_version", "compatible_brands", "encoder"}) {
+    av_dict_set(&output.metadata, key, nullptr, 0);
+  }
+  CopyChapters();
+}
+
+void StreamCopy::CopyVideoProperties(const AVStream& from, AVStream& to) {
+  av_dict_copy(&to.metadata, from.metadata, 0);
+  for (const char* key : {"rotate", "encoder", "DURATION", "BPS", "NUMBER_OF_BYTES"}) {
+    av_dict_set(&to.metadata, key, nullptr, 0);
+  }
+  to.disposition = from.disposition;
+  for (int i = 0; i < from.nb_side_data; ++i) {
+    const AVPacketSideData& data = from.side_data[i];
+    switch (data.type) {
+      case AV_PKT_DATA_MASTERING_DISPLAY_METADATA:
+      case AV_PKT_DATA_CONTENT_LIGHT_LEVEL:
+      case AV_PKT_DATA_STEREO3D:
+      case AV_PKT_DATA_SPHERICAL: {
+        std::uint8_t* copy = av_stream_new_side_data(&to, data.type, data.size);
+        if (copy) std::memcpy(copy, data.data, data.size);
+        break;
+      }
+      default:
+        break;  // about the old encoding, or applied to the pixels
+    }
+  }
+}
+
+void StreamCopy::CopyChapters() {
+  if (input_->nb_chapters == 0) return;
+  output_.chapters =
+      static_cast<AVChapter**>(NotNull(av_calloc(input_->nb_chapters, sizeof(AVChapter*))));
+  for (unsigned i = 0; i < input_->nb_chapters; ++i) {
+    const AVChapter& from = *input_->chapters[i];
+    auto* to = static_cast<AVChapter*>(NotNull(av_mallocz(sizeof(AVChapter))));
+    const std::int64_t shift = av_rescale_q(offset_, AV_TIME_BASE_Q, from.time_base);
+    to->id = from.id;
+    to->time_base = from.time_base;
+    to->start = std::max<std::int64_t>(from.start - shift, 0);
+    to->end = std::max(from.end - shift, to->start);
+    av_dict_copy(&to->metadata, from.metadata, 0);
+    output_.chapters[output_.nb_chapters++] = to;
+  }
+}
+
+PacketPtr StreamCopy::Next() {
+  if (to_.empty()) return nullptr;
+  PacketPtr packet = NewPacket();
+  while (av_read_frame(input_.get(), packet.get()) >= 0) {
+    const auto found = to_.find(packet->stream_index);
+    if (found == to_.end()) {
+      av_packet_unref(packet.get());
+      continue;
+    }
+    const AVRational from = input_->streams[packet->stream_index]->time_base;
+    const AVRational to = output_.streams[found->second]->time_base;
+    const std::int64_t shift = av_rescale_q(offset_, AV_TIME_BASE_Q, from);
+    if (packet->pts != AV_NOPTS_VALUE) packet->pts -= shift;
+    if (packet->dts == AV_NOPTS_VALUE) {
+      packet->dts = packet->pts;
+    } else {
+      packet->dts -= shift;
+    }
+    av_packet_rescale_ts(packet.get(), from, to);
+    packet->stream_index = found->second;
+    packet->pos = -1;
+    const auto last = last_dts_.find(packet->stream_index);
+    if (packet->dts != AV_NOPTS_VALUE) {
+      const bool strict = !(output_.oformat->flags & AVFMT_TS_NONSTRICT);
+      if (last != last_dts_.end() && packet->dts < last->second + strict) {
+        packet->dts = last->second + strict;
+        if (packet->pts != AV_NOPTS_VALUE) packet->pts = std::max(packet->pts, packet->dts);
+      }
+      last_dts_[packet->stream_index] = packet->dts;
+      time_ = std::max(time_, av_rescale_q(packet->dts, to, AV_TIME_BASE_Q));
+    }
+    return packet;
+  }
+  return nullptr;
+}
+
+}  // namespace calmframe::media

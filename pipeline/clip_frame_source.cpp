@@ -1,0 +1,37 @@
+#include "pipeline/clip_frame_source.h"
+
+namespace calmframe::pipeline {
+
+ClipFrameSource::ClipFrameSource(media::ClipReader& reader, boost::function<void(std::size_t)> poll)
+    : info_(reader.info()), reader_(reader), poll_(std::move(poll)) {}
+
+std::size_t ClipFrameSource::width() const {
+  return static_cast<std::size_t>(info_.width);
+}
+std::size_t ClipFrameSource::height() const {
+  return static_cast<std::size_t>(info_.height);
+}
+std::size_t ClipFrameSource::frame_count() const {
+  return reader_.pictures().count();
+}
+
+marrow::tracking::ArgbFrame ClipFrameSource::Fetch(std::size_t picture) {
+  if (polled_ != picture) poll_(picture);
+  polled_ = picture;
+  const WorldX<HX_Pixel8>& world = *reader_.Read(picture);
+  return {&world.data()->alpha, world.row_bytes(), width(), height()};
+}
+
+void ClipFrameSource::LoadLuma(std::size_t picture, float* destination) {
+  LumaFromArgb(Fetch(picture), destination);
+}
+
+void ClipFrameSource::LoadMask(std::size_t picture, std::uint8_t* destination) {
+  MaskFromArgb(Fetch(picture), destination);
+}
+
+void ClipFrameSource::LoadColor(std::size_t picture, float* destination) {
+  ColorFromArgb(Fetch(picture), destination);
+}
+
+}  // namespace calmframe::pipeline

@@ -1,0 +1,129 @@
+#include <algorithm>
+#include <boost/make_shared.hpp>
+#include <cstring>
+
+#include "pipeline/pictures.h"
+#include "pipeline/stabilize.h"
+#include "stabilizer/render/cp_warper_warps.h"
+#include "stabilizer/render/frame_renderer.h"
+
+namespace calmframe::pipeline {
+namespace {
+
+constexpr char kRendering[] = "rendering";
+
+template <class Pixel>
+class ClipSource final : public SourceFrames<Pixel> {
+ public:
+  explicit ClipSource(media::ClipReader& reader) : reader_(reader) {}
+  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t picture) override {
+    return reader_.Read(picture);
+  }
+  const Pictures& pictures() const { return reader_.pictures(); }
+
+ private:
+  PictureReader<Pixel> reader_;
+};
+
+RenderSettings SettingsOf(const kelp::effect::Controls& controls) {
+  RenderSettings settings;
+  settings.framing = controls.framing;
+  settings.action_safe = static_cast<float>(controls.action_safe_margin / 100.0);
+  settings.maximum_scale = static_cast<float>(controls.maximum_scale / 100.0);
+  settings.additional_scale = static_cast<float>(controls.additional_scale / 100.0);
+  return settings;
+}
+
+// Copies the part of `from` that lies in `to`, whose top left is at (origin_x, origin_y) of `from`;
+// the rest is cleared.
+template <class Pixel>
+void CopyWindow(const WorldX<Pixel>& from, int origin_x, int origin_y, WorldX<Pixel>& to) {
+  to.clear();
+  const int x0 = std::max(0, -origin_x);
+  const int x1 = std::min(to.width(), from.width() - origin_x);
+  if (x0 >= x1) return;
+  for (int y = std::max(0, -origin_y); y < std::min(to.height(), from.height() - origin_y); ++y) {
+    std::memcpy(to.row(y) + x0, from.row(y + origin_y) + origin_x + x0,
+                sizeof(Pixel) * static_cast<std::size_t>(x1 - x0));
+  }
+}
+
+// Renders pictures at the clip's size.
+template <class Pixel>
+class PictureRenderer {
+ public:
+  PictureRenderer(media::ClipReader& reader, const Solution& solution,
+                  const kelp::effect::Controls& controls)
+      : sources_(reader),
+        warps_(solution.warper),
+        crop_(solution.crop),
+        settings_(SettingsOf(controls)),
+        renderer_(MakeRenderer(warps_, 1.0f / GeometryOf(reader.info()).pixel_aspect(), 1.0f)),
+        rect_(setupOutputRect(settings_.framing, renderer_, reader.info().width,
+                              reader.info().height)),
+        whole_(rect_.width, rect_.height) {}
+
+  const Pictures& pictures() const { return sources_.pictures(); }
+
+  void Render(std::size_t picture, WorldX<Pixel>& output) {
+    const bool same = rect_.width == output.width() && rect_.height == output.height();
+    WorldX<Pixel>& target = same ? output : whole_;
+    if (!renderFrame(warps_, crop_.get(), settings_, renderer_, picture, sources_, target)) {
+      throw SolveFailure("a frame has no warp");
+    }
+    if (!same) CopyWindow(whole_, rect_.origin_x, rect_.origin_y, output);
+  }
+
+ private:
+  ClipSource<Pixel> sources_;
+  const CPWarperWarps warps_;
+  const boost::shared_ptr<const cropper> crop_;
+  const RenderSettings settings_;
+  Renderer renderer_;
+  const OutputRect rect_;
+  WorldX<Pixel> whole_;
+};
+
+template <class Pixel>
+void RenderAs(media::ClipReader& reader, const Solution& solution,
+              const kelp::effect::Controls& controls, media::ClipWriter& writer,
+              Listener& listener) {
+  const media::ClipInfo& info = reader.info();
+  PictureRenderer<Pixel> renderer(reader, solution, controls);
+  const Pictures& pictures = renderer.pictures();
+  WorldX<Pixel> output(info.width, info.height);
+  WorldX<Pixel> field(pictures.interlaced() ? info.width : 0, info.height);
+  const auto total = static_cast<double>(info.frame_count);
+  for (std::size_t frame = 0; frame < info.frame_count; ++frame) {
+    if (listener.Cancelled()) throw Interrupted();
+    listener.Progress(kRendering, static_cast<double>(frame), total, "frames");
+    if (pictures.interlaced()) {
+      for (std::size_t picture = 2 * frame; picture < 2 * frame + 2; ++picture) {
+        renderer.Render(picture, field);
+        CopyField(field, pictures.parity_of(picture), output);
+      }
+    } else {
+      renderer.Render(frame, output);
+    }
+    writer.Write(frame, output.data(), output.row_bytes());
+  }
+  listener.Progress(kRendering, total, total, "frames");
+}
+
+}  // namespace
+
+void Render(media::ClipReader& reader, const Solution& solution,
+            const kelp::effect::Controls& controls, int depth, media::ClipWriter& writer,
+            Listener& listener) {
+  if (depth == 0) depth = reader.info().bit_depth > 8 ? 16 : 8;
+  switch (depth) {
+    case 8:
+      return RenderAs<HX_Pixel8>(reader, solution, controls, writer, listener);
+    case 16:
+      return RenderAs<HX_Pixel16>(reader, solution, controls, writer, listener);
+    default:
+      return RenderAs<HX_PixelFloat>(reader, solution, controls, writer, listener);
+  }
+}
+
+}  // namespace calmframe::pipeline

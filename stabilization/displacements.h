@@ -1,0 +1,51 @@
+#pragma once
+
+#include <cstdint>
+#include <vector>
+
+#include "stabilization/solve_records.h"
+#include "stabilization/solver_params.h"
+
+namespace marrow::stabilization {
+
+// A track's sample on one frame with the place where the stabilized result wants it.
+struct Displacement {
+  std::int32_t cellX = 0;  // grid cell that holds the source position
+  std::int32_t cellY = 0;
+  double fracX = 0;  // position inside the cell, 0 to 1
+  double fracY = 0;
+  double sourceX = 0;  // the track's position in the frame, pixels
+  double sourceY = 0;
+  double targetX = 0;  // the wanted position in the output frame
+  double targetY = 0;
+  double weight = 0;                  // non-negative
+  const Trajectory* track = nullptr;  // owned by stabilizer_global
+  std::int32_t nextIndex = -1;        // of the track's record in the next frame's list; -1 if none
+  std::int32_t prevIndex = -1;
+  bool outlier = false;  // set by the robust pass
+};
+
+// One list a frame of the clip. A track's records are linked from frame to frame by index.
+using displacement_lists = std::vector<std::vector<Displacement>>;
+
+// The displacements of a solved clip: a record for each frame from a track's first stabilized
+// sample to its first frame without one. Across the start of a window, [first, overlap_end), the
+// target moves from the window's overlap_rows to global.output, linearly in time. Tracks shorter
+// than parameters.track_fade_minimum make no record.
+displacement_lists blended_displacements(const stabilizer_global& global,
+                                         const std::vector<factorization_window>& windows,
+                                         const SolverParamsRecord& parameters);
+
+// The displacements of a clip that is still being solved: for each track the frames from the first
+// whose window it takes part in to the first whose window it does not take part in, or which has no
+// window. Targets are whatever `output` holds and wait for refresh_targets.
+displacement_lists member_displacements(const stabilizer_global& global,
+                                        const std::vector<factorization_window>& windows,
+                                        const SolverParamsRecord& parameters);
+
+// On frames [first, end): drops the records whose stabilized sample is missing, closing the gap and
+// keeping every link right, and sets the targets of the others to their sample.
+void refresh_targets(displacement_lists& lists, const stabilizer_global& global, std::int32_t first,
+                     std::int32_t end);
+
+}  // namespace marrow::stabilization

@@ -1,0 +1,27 @@
+#pragma once
+
+#include <boost/shared_ptr.hpp>
+
+#include "stabilization/cp_warper.h"
+#include "stabilizer/render/frame_renderer.h"
+
+// A warper's records as the renderer reads them. The warper's union bounds must have been computed.
+class CPWarperWarps final : public ClipWarps {
+ public:
+  explicit CPWarperWarps(boost::shared_ptr<const marrow::stabilization::CPWarper> warper)
+      : warper_(warper) {}
+  std::size_t frameCount() const override { return warper_->frameWarpCount(); }
+  const marrow::stabilization::VarVector& frameWarp(std::size_t frame) const override {
+    return *warper_->frameWarp(frame);
+  }
+  marrow::stabilization::frame_bounds unionBounds() const override {
+    return warper_->unionBounds();
+  }
+  std::int32_t frameWidth() const override { return warper_->frameWidth(); }
+  std::int32_t frameHeight() const override { return warper_->frameHeight(); }
+  std::int32_t gridCols() const override { return warper_->gridCols(); }
+  std::int32_t gridRows() const override { return warper_->gridRows(); }
+
+ private:
+  boost::shared_ptr<const marrow::stabilization::CPWarper> warper_;
+};

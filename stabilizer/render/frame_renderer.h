@@ -1,0 +1,96 @@
+#pragma once
+
+#include <boost/shared_ptr.hpp>
+#include <cstddef>
+#include <cstdint>
+#include <vector>
+
+#include "stabilization/cropper.h"
+#include "stabilization/var_vector.h"
+#include "stabilizer/render/renderer.h"
+#include "stabilizer/render/world.h"
+
+// The popup's values.
+enum class Framing : std::int32_t {
+  stabilize_only = 1,
+  crop = 2,
+  crop_auto_scale = 3,
+  synthesize_edges = 4
+};
+
+inline bool crops(Framing framing) {
+  return framing == Framing::crop || framing == Framing::crop_auto_scale;
+}
+
+// A solved clip as the renderer needs it. Read-only; any thread may call.
+class ClipWarps {
+ public:
+  virtual ~ClipWarps() = default;
+  virtual std::size_t frameCount() const = 0;
+  virtual const marrow::stabilization::VarVector& frameWarp(std::size_t frame) const = 0;
+  virtual marrow::stabilization::frame_bounds unionBounds() const = 0;
+  virtual std::int32_t frameWidth() const = 0;  // square pixels
+  virtual std::int32_t frameHeight() const = 0;
+  virtual std::int32_t gridCols() const = 0;
+  virtual std::int32_t gridRows() const = 0;
+};
+
+// Where source frames come from: the analysed clip's frame `frame`, at the render's scale. Failures
+// are thrown and leave the render.
+template <class Pixel>
+class SourceFrames {
+ public:
+  virtual ~SourceFrames() = default;
+  virtual boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) = 0;
+};
+
+struct RenderSettings {
+  Framing framing = Framing::crop_auto_scale;
+  float action_safe = 0.0f;       // fraction of the frame
+  float maximum_scale = 1.5f;     // fraction; for crop_auto_scale alone
+  float additional_scale = 1.0f;  // fraction, above 0
+  // What the given output differs by from the one that setupOutputRect asked for, in pixels: the
+  // output's origin plus the setup's.
+  double shift_x = 0.0;
+  double shift_y = 0.0;
+};
+
+// The renderer of a clip at a render scale; see Renderer.
+Renderer MakeRenderer(const ClipWarps& warps, float scaleX, float scaleY);
+
+// The scale at which the picture is shown: additional_scale, with a crop window times what fitZoom
+// finds; that also sets the renderer's output rectangle.
+double GetZoom(const ClipWarps& warps, const cropper* crop, const RenderSettings& settings,
+               Renderer& renderer);
+
+struct OutputRect {
+  std::int32_t width;
+  std::int32_t height;
+  std::int32_t origin_x;  // of the frame's top left in the output
+  std::int32_t origin_y;
+};
+
+// The output's size for a frame of width x height output pixels. Without a crop the whole plane of
+// the warps is shown, the frame in its middle.
+OutputRect setupOutputRect(Framing framing, const Renderer& renderer, std::int32_t width,
+                           std::int32_t height);
+
+// The frame's outline in the output, pairs x, y of every border vertex: top row left to right,
+// right column downwards, bottom row right to left, left column upwards, corners twice.
+std::vector<float> outlinePolygon(const ClipWarps& warps, std::size_t frame,
+                                  const Renderer& renderer, const RenderSettings& settings,
+                                  double setupOriginX, double setupOriginY);
+
+// Draws a frame of `source` through a record over what `output` holds. The strips run on all
+// processors; their number never shows in the result.
+template <class Pixel>
+void warpFrameInto(const marrow::stabilization::VarVector& warp, const crop_rect& cropRect,
+                   double zoom, const RenderSettings& settings, const Renderer& renderer,
+                   const WorldX<Pixel>& source, WorldX<Pixel>& output);
+
+// Clears the output and draws the stabilized frame. `crop` may be null. False, with nothing done,
+// where the clip has no record of the frame.
+template <class Pixel>
+bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettings& settings,
+                 Renderer& renderer, std::size_t frame, SourceFrames<Pixel>& sources,
+                 WorldX<Pixel>& output);

@@ -1,0 +1,36 @@
+#pragma once
+
+#include <cstddef>
+
+#include "platform/hx/hx_pixel.h"
+
+// Bilinear samples of a source along a straight run of output pixels.
+
+// Source position of pixel k of a run, k = 0 .. count - 1: x + k * dx / (1 + g * k), and the same
+// for y. It is the exact form of a projective map along a row.
+struct source_run {
+  double x;
+  double y;
+  double dx;
+  double dy;
+  double g;
+};
+
+struct source_plane {
+  const unsigned char* data;  // any alignment
+  std::ptrdiff_t row_bytes;
+  int width;  // at least 1
+  int height;
+  double max_x;  // positions are clamped to 0.0001 .. max_x
+  double max_y;
+};
+
+// The longest run: positions are computed in f32 relative to the run's start, so that their error
+// stays below 2e-5 pixels wherever in the source the run lies.
+inline constexpr int max_run = 64;
+
+// Writes `count` <= max_run samples. Colours are weighted by alpha; where no neighbour has any the
+// sample is all zero. Positions that are not finite sample the top left.
+void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel8* out);
+void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel16* out);
+void SampleRun(const source_plane& source, const source_run& run, int count, HX_PixelFloat* out);

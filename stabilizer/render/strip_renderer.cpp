@@ -1,0 +1,263 @@
+#include "stabilizer/render/strip_renderer.h"
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+
+using marrow::stabilization::matrix3;
+using marrow::stabilization::point2;
+
+namespace {
+
+// Tall enough that few cells are set up twice, low enough to keep many processors busy.
+constexpr std::int64_t band_rows = 64;
+
+constexpr double max_coordinate = 1e30;  // products of two stay finite
+
+bool usable(point2 p) {
+  return std::fabs(p.x) < max_coordinate && std::fabs(p.y) < max_coordinate;
+}
+
+std::int64_t whole(double v) {
+  return static_cast<std::int64_t>(std::clamp(std::isnan(v) ? 0.0 : v, -1e15, 1e15));
+}
+
+// One directed edge of a quadrilateral; the inside lies where cross >= 0.
+struct edge {
+  point2 from;
+  double dx;
+  double dy;
+
+  double cross(double x, double y) const { return dx * (y - from.y) - dy * (x - from.x); }
+
+  // Cuts [x0, x1) down to the x of row y that are inside. Each rounding in cross() is monotone in
+  // x, so what passes is one stretch, and only its end has to be looked for, from where the edge
+  // meets the row in exact arithmetic.
+  void cut(double zoom, double y, std::int64_t& x0, std::int64_t& x1) const {
+    const auto inside = [&](std::int64_t x) {
+      return cross(static_cast<double>(x) / zoom, y) >= 0;
+    };
+    if (x0 >= x1) return;
+    if (dy == 0) {
+      if (!inside(x0)) x1 = x0;
+      return;
+    }
+    const double meet = (from.x + dx * (y - from.y) / dy) * zoom;
+    std::int64_t x = static_cast<std::int64_t>(
+        std::clamp(std::floor(meet), static_cast<double>(x0 - 1), static_cast<double>(x1)));
+    if (dy > 0) {  // a stretch that begins at x0; find the first x past it
+      x = std::max(x, x0);
+      while (x < x1 && inside(x)) ++x;
+      while (x > x0 && !inside(x - 1)) --x;
+      x1 = x;
+    } else {  // a stretch that ends at x1; find its first x
+      x = std::max(x, x0);
+      while (x < x1 && !inside(x)) ++x;
+      while (x > x0 && inside(x - 1)) --x;
+      x0 = x;
+    }
+  }
+
+  // Squared distance of the edge's line.
+  double distance2(double x, double y) const {
+    const double length2 = dx * dx + dy * dy;
+    if (length2 == 0) return 0;
+    const double c = cross(x, y);
+    return c * c / length2;
+  }
+};
+
+edge between(point2 a, point2 b) {
+  return {a, b.x - a.x, b.y - a.y};
+}
+
+}  // namespace
+
+template <class Pixel>
+struct StripRenderer<Pixel>::cell {
+  std::int32_t c;
+  std::int32_t r;
+  matrix3 square_from_plane;
+};
+
+template <class Pixel>
+StripRenderer<Pixel>::StripRenderer(const Renderer& renderer, const std::vector<double>& vertices,
+                                    const WorldX<Pixel>& source, WorldX<Pixel>& destination,
+                                    const crop_rect& cropRect, double zoom, bool crop)
+    : renderer_(renderer),
+      vertices_(vertices),
+      destination_(destination),
+      source_{reinterpret_cast<const unsigned char*>(source.data()),
+              source.row_bytes(),
+              source.width(),
+              source.height(),
+              std::min(renderer.sourceWidth, source.width()) - 1.0001,
+              std::min(renderer.sourceHeight, source.height()) - 1.0001},
+      crop_(crop),
+      zoom_(zoom) {
+  const double cx = ((cropRect.right + renderer.boundsMinX) * zoom +
+                     (cropRect.left + renderer.boundsMinX) * zoom) /
+                    2;
+  const double cy = ((cropRect.bottom + renderer.boundsMinY) * zoom +
+                     (cropRect.top + renderer.boundsMinY) * zoom) /
+                    2;
+  const double hx = ((crop ? destination.width() : renderer.planeWidth) - 1) * 0.5;
+  const double hy = ((crop ? destination.height() : renderer.planeHeight) - 1) * 0.5;
+  to_destination_x_ = whole(hx) - whole(cx);
+  to_destination_y_ = whole(hy) - whole(cy);
+  offset_x_ = (cx - std::trunc(cx)) - (hx - std::trunc(hx));
+  offset_y_ = (cy - std::trunc(cy)) - (hy - std::trunc(hy));
+  limit_x_ = std::trunc(renderer.planeWidth * zoom);
+  limit_y_ = std::trunc(renderer.planeHeight * zoom);
+  tolerance2_ = std::max(4.0, 4.0 / (zoom * zoom));
+  for (std::int32_t r = 0; r < renderer.rows; ++r) {
+    row_extent extent{std::numeric_limits<double>::infinity(),
+                      -std::numeric_limits<double>::infinity()};
+    for (std::int32_t c = 0; c < renderer.cols; ++c) {
+      const point2 p = vertex(c, r);
+      if (!usable(p)) continue;
+      extent = {std::min(extent.min_y, p.y), std::max(extent.max_y, p.y)};
+    }
+    extents_.push_back(extent);
+  }
+}
+
+template <class Pixel>
+std::size_t StripRenderer<Pixel>::bands() const {
+  return static_cast<std::size_t>((destination_.height() + band_rows - 1) / band_rows);
+}
+
+template <class Pixel>
+void StripRenderer<Pixel>::operator()(std::size_t band) const {
+  const std::int64_t first = static_cast<std::int64_t>(band) * band_rows;
+  const std::int64_t end = std::min<std::int64_t>(first + band_rows, destination_.height());
+  // A zoom of 0 shows nothing.
+  if (!(zoom_ > 0) || source_.width < 1 || source_.height < 1) return;
+  for (std::int32_t r = 0; r + 1 < renderer_.rows; ++r) drawGridRow(r, first, end);
+}
+
+template <class Pixel>
+void StripRenderer<Pixel>::drawGridRow(std::int32_t r, std::int64_t first_row,
+                                       std::int64_t end_row) const {
+  const row_extent& a = extents_[static_cast<std::size_t>(r)];
+  const row_extent& b = extents_[static_cast<std::size_t>(r) + 1];
+  const auto to_destination = static_cast<double>(to_destination_y_);
+  if (std::floor(zoom_ * std::min(a.min_y, b.min_y) - 1) + to_destination >=
+          static_cast<double>(end_row) ||
+      std::ceil(zoom_ * std::max(a.max_y, b.max_y) + 1) + to_destination <=
+          static_cast<double>(first_row)) {
+    return;
+  }
+  for (std::int32_t c = 0; c + 1 < renderer_.cols; ++c) drawCell(c, r, first_row, end_row);
+}
+
+template <class Pixel>
+void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t first_row,
+                                    std::int64_t end_row) const {
+  const point2 p00 = vertex(c, r);
+  const point2 p10 = vertex(c + 1, r);
+  const point2 p01 = vertex(c, r + 1);
+  const point2 p11 = vertex(c + 1, r + 1);
+  if (!usable(p00) || !usable(p10) || !usable(p01) || !usable(p11)) return;
+
+  const bool top = r == 0;
+  const bool bottom = r == renderer_.rows - 2;
+  const bool left = c == 0;
+  const bool right = c == renderer_.cols - 2;
+  const bool border = (!crop_ || renderer_.edgeTolerant) && (top || bottom || left || right);
+
+  // The window in destination coordinates, then both clipped in the zoomed plane.
+  std::int64_t window_x0 = 0;
+  std::int64_t window_x1 = destination_.width();
+  std::int64_t window_y0 = first_row;
+  std::int64_t window_y1 = end_row;
+  if (!border && crop_) {
+    window_x0 = std::max<std::int64_t>(window_x0, renderer_.outLeft);
+    window_x1 = std::min<std::int64_t>(window_x1, renderer_.outRight);
+    window_y0 = std::max<std::int64_t>(window_y0, renderer_.outTop);
+    window_y1 = std::min<std::int64_t>(window_y1, renderer_.outBottom);
+  }
+  const double min_x = std::min({p00.x, p10.x, p01.x, p11.x});
+  const double max_x = std::max({p00.x, p10.x, p01.x, p11.x});
+  const double min_y = std::min({p00.y, p10.y, p01.y, p11.y});
+  const double max_y = std::max({p00.y, p10.y, p01.y, p11.y});
+  const std::int64_t x0 =
+      std::max(whole(std::floor(zoom_ * min_x - 1)), window_x0 - to_destination_x_);
+  const std::int64_t x1 = std::min(whole(std::min(std::ceil(zoom_ * max_x + 1), limit_x_)),
+                                   window_x1 - to_destination_x_);
+  const std::int64_t y0 =
+      std::max(whole(std::floor(zoom_ * min_y - 1)), window_y0 - to_destination_y_);
+  const std::int64_t y1 = std::min(whole(std::min(std::ceil(zoom_ * max_y + 1), limit_y_)),
+                                   window_y1 - to_destination_y_);
+  if (x0 >= x1 || y0 >= y1) return;
+
+  const cell q{
+      c, r,
+      marrow::stabilization::inverse(marrow::stabilization::square_to_quad(p00, p10, p01, p11))};
+  for (const double entry : q.square_from_plane) {
+    if (!std::isfinite(entry)) return;  // the quadrilateral has no inside
+  }
+  const edge edges[4] = {between(p00, p10), between(p10, p11), between(p11, p01),
+                         between(p01, p00)};
+  const bool owned[4] = {top, right, bottom, left};
+
+  for (std::int64_t y = y0; y < y1; ++y) {
+    const double py = (static_cast<double>(y) + offset_y_) / zoom_;
+    if (!(py < renderer_.planeHeight)) break;
+    const double test_y = static_cast<double>(y) / zoom_;
+    Pixel* row = destination_.row(static_cast<int>(y + to_destination_y_));
+
+    std::int64_t inside0 = x0;
+    std::int64_t inside1 = x1;
+    for (const edge& e : edges) e.cut(zoom_, test_y, inside0, inside1);
+    if (!border) {
+      drawSpan(q, inside0, inside1, py, row);
+      continue;
+    }
+    // A border cell also takes what lies near an outer edge that it owns.
+    if (inside0 >= inside1) inside0 = inside1 = x1;
+    const auto near = [&](std::int64_t x) {
+      for (int i = 0; i < 4; ++i) {
+        if (owned[i] && edges[i].distance2(static_cast<double>(x) / zoom_, test_y) < tolerance2_) {
+          return true;
+        }
+      }
+      return false;
+    };
+    std::int64_t begin = x0;
+    for (std::int64_t x = x0; x < x1; ++x) {
+      if (x == inside0) x = inside1;
+      if (x < x1 && near(x)) continue;
+      drawSpan(q, begin, std::min(x, x1), py, row);
+      begin = x + 1;
+    }
+    drawSpan(q, begin, x1, py, row);
+  }
+}
+
+// Plane positions of the row's pixels are ((x + offset) / zoom, py).
+template <class Pixel>
+void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py,
+                                    Pixel* row) const {
+  const auto plane_x = [&](std::int64_t x) { return (static_cast<double>(x) + offset_x_) / zoom_; };
+  while (x0 < x1 && !(plane_x(x1 - 1) < renderer_.planeWidth)) --x1;
+  const matrix3& h = q.square_from_plane;
+  for (std::int64_t x = x0; x < x1; x += max_run) {
+    const double px = plane_x(x);
+    const double inverse_w = 1.0 / (h[6] * px + h[7] * py + h[8]);
+    const double u = (h[0] * px + h[1] * py + h[2]) * inverse_w;
+    const double v = (h[3] * px + h[4] * py + h[5]) * inverse_w;
+    // u(x + k) - u(x) = k (h0 - u h6) / zoom / (w + k h6 / zoom), and v likewise.
+    const double step = inverse_w / zoom_;
+    const source_run run{(q.c + u) * renderer_.cellWidth - 0.5,
+                         (q.r + v) * renderer_.cellHeight - 0.5,
+                         (h[0] - u * h[6]) * step * renderer_.cellWidth,
+                         (h[3] - v * h[6]) * step * renderer_.cellHeight, h[6] * step};
+    SampleRun(source_, run, static_cast<int>(std::min<std::int64_t>(max_run, x1 - x)),
+              row + (x + to_destination_x_));
+  }
+}
+
+template class StripRenderer<HX_Pixel8>;
+template class StripRenderer<HX_Pixel16>;
+template class StripRenderer<HX_PixelFloat>;

@@ -1,0 +1,83 @@
+#pragma once
+
+// Rules that hold throughout this folder. A frame is rows of pixels, top row first, row_bytes apart
+// (any padding); a pixel is alpha, red, green, blue in memory, not premultiplied. A pixel's centre
+// lies at whole coordinates. Warps lead from the source to the output: a vertex is where a source
+// point lands. Outside the source there is nothing: the output stays transparent black.
+
+#include <boost/gil/image_view_factory.hpp>
+#include <boost/gil/typedefs.hpp>
+#include <cstddef>
+#include <cstring>
+#include <memory>
+
+#include "platform/hx/hx_pixel.h"
+
+// The gil view of a frame of `Pixel`.
+template <class Pixel>
+struct world_view;
+template <>
+struct world_view<HX_Pixel8> {
+  using type = boost::gil::argb8_view_t;
+};
+template <>
+struct world_view<HX_Pixel16> {
+  using type = boost::gil::argb16_view_t;
+};
+template <>
+struct world_view<HX_PixelFloat> {
+  using type = boost::gil::argb32f_view_t;
+};
+
+// A frame buffer: its own, or one that somebody else keeps alive.
+template <class Pixel>
+class WorldX {
+ public:
+  using view_type = typename world_view<Pixel>::type;
+  using const_view_type = typename view_type::const_t;
+
+  // Owns a cleared buffer without padding.
+  WorldX(int width, int height)
+      : owned_(new Pixel[static_cast<std::size_t>(width) * static_cast<std::size_t>(height)]()),
+        data_(owned_.get()),
+        width_(width),
+        height_(height),
+        row_bytes_(static_cast<std::ptrdiff_t>(sizeof(Pixel)) * width) {}
+  // Borrows `data`, which must outlive this. row_bytes: at least width pixels.
+  WorldX(int width, int height, std::ptrdiff_t row_bytes, Pixel* data)
+      : data_(data), width_(width), height_(height), row_bytes_(row_bytes) {}
+
+  int width() const { return width_; }
+  int height() const { return height_; }
+  std::ptrdiff_t row_bytes() const { return row_bytes_; }
+  Pixel* data() { return data_; }
+  const Pixel* data() const { return data_; }
+  Pixel* row(int y) {
+    return reinterpret_cast<Pixel*>(reinterpret_cast<unsigned char*>(data_) + row_bytes_ * y);
+  }
+  const Pixel* row(int y) const { return const_cast<WorldX*>(this)->row(y); }
+
+  view_type view() {
+    return boost::gil::interleaved_view(
+        static_cast<std::ptrdiff_t>(width_), static_cast<std::ptrdiff_t>(height_),
+        reinterpret_cast<typename view_type::value_type*>(data_), row_bytes_);
+  }
+  const_view_type view() const { return const_cast<WorldX*>(this)->view(); }
+
+  // Transparent black; padding is left alone.
+  void clear() {
+    const std::size_t bytes = sizeof(Pixel) * static_cast<std::size_t>(width_);
+    if (row_bytes_ == static_cast<std::ptrdiff_t>(bytes)) {
+      if (bytes != 0) std::memset(static_cast<void*>(data_), 0, bytes * height_);
+      return;
+    }
+    for (int y = 0; y < height_; ++y) std::memset(static_cast<void*>(row(y)), 0, bytes);
+  }
+
+ private:
+  std::unique_ptr<Pixel[]> owned_;
+  Pixel* data_;
+  int width_;
+  int height_;
+  std::ptrdiff_t row_bytes_;
+};

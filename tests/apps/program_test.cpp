@@ -1,0 +1,205 @@
+// The program as a person meets it: run as a process, judged by its exit code, its one line, and
+// the files that it leaves.
+
+#include <gmock/gmock.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <string>
+#include <vector>
+
+#include "host/media/clip.h"
+#include "synthetic/scene.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using calmframe::media::ClipInfo;
+using calmframe::media::ClipReader;
+using calmframe::media::ClipWriter;
+using ::testing::HasSubstr;
+
+struct Outcome {
+  int code;
+  std::string text;  // standard output and error together
+};
+
+class ProgramTest : public ::testing::Test {
+ protected:
+  ProgramTest() {
+    std::string name = (fs::temp_directory_path() / "calmframe-program-XXXXXX").string();
+    folder_ = mkdtemp(name.data());
+  }
+  ~ProgramTest() override { fs::remove_all(folder_); }
+
+  std::string Path(const std::string& name) const { return folder_ / name; }
+
+  Outcome Run(const std::string& arguments) const {
+    const std::string command =
+        "cd '" + folder_.string() + "' && " CALMFRAME_PROGRAM " " + arguments + " 2>&1";
+    Outcome outcome{-1, ""};
+    FILE* pipe = popen(command.c_str(), "r");
+    std::array<char, 512> part;
+    while (std::fgets(part.data(), part.size(), pipe)) outcome.text += part.data();
+    outcome.code = WEXITSTATUS(pclose(pipe));
+    return outcome;
+  }
+
+  // A clip of the synthetic scene.
+  void MakeClip(const std::string& name, int width, int height, int frames) const {
+    ClipInfo info;
+    info.width = width;
+    info.height = height;
+    info.frame_rate = {30, 1};
+    info.frame_count = static_cast<std::size_t>(frames);
+    const auto writer = ClipWriter::Create(Path(name), info, width, height, {});
+    synthetic::scene_options options;
+    options.width = width;
+    options.height = height;
+    options.frame_count = frames;
+    const synthetic::scene scene(synthetic::street(1), synthetic::handheld_path({}), options);
+    std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(width * height));
+    for (int f = 0; f < frames; ++f) {
+      scene.render(f, pixels.data(), static_cast<std::size_t>(width));
+      writer->Write(static_cast<std::size_t>(f), pixels.data(), width * 4);
+    }
+    writer->Finish();
+  }
+
+  void MakeFile(const std::string& name, const std::string& content) const {
+    std::ofstream(Path(name)) << content;
+  }
+
+  std::vector<std::string> Files() const {
+    std::vector<std::string> names;
+    for (const auto& entry : fs::directory_iterator(folder_))
+      names.push_back(entry.path().filename());
+    std::sort(names.begin(), names.end());
+    return names;
+  }
+
+  // One line that starts with the program's name, and nothing else.
+  static void ExpectOneLine(const Outcome& outcome, const std::string& part) {
+    EXPECT_THAT(outcome.text, ::testing::StartsWith("calmframe: "));
+    EXPECT_EQ(std::count(outcome.text.begin(), outcome.text.end(), '\n'), 1) << outcome.text;
+    EXPECT_THAT(outcome.text, HasSubstr(part));
+  }
+
+  fs::path folder_;
+};
+
+TEST_F(ProgramTest, ClipsOfAnyShapeKeepTheirFramesAndSize) {
+  const struct {
+    int width, height, frames;
+    const char* flags;
+  } cases[] = {{160, 120, 45, ""},
+               {160, 120, 1, ""},
+               {90, 160, 6, "--method position --framing crop"},
+               {161, 121, 12, "--result no-motion --framing stabilize-only --depth 16"},
+               {20, 20, 3, "--depth 32 --crop-less-smooth-more 100"}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(std::to_string(c.width) + "x" + std::to_string(c.height) + " " + c.flags);
+    MakeClip("in.mp4", c.width, c.height, c.frames);
+    const Outcome outcome = Run(std::string("stabilize in.mp4 out.mp4 --quiet ") + c.flags);
+    EXPECT_EQ(outcome.code, 0) << outcome.text;
+    EXPECT_EQ(outcome.text, "");
+    const auto reader = ClipReader::Open(Path("out.mp4"));
+    EXPECT_EQ(reader->info().frame_count, static_cast<std::size_t>(c.frames));
+    EXPECT_EQ(reader->info().width, c.width);
+    EXPECT_EQ(reader->info().height, c.height);
+    EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "out.mp4"));
+    fs::remove(Path("in.mp4"));
+    fs::remove(Path("out.mp4"));
+  }
+}
+
+TEST_F(ProgramTest, InputThatIsNoClip) {
+  MakeFile("empty.mp4", "");
+  MakeFile("garbage.mp4", std::string(5000, 'x'));
+  MakeFile("notes.txt", "no video here\n");
+  MakeClip("tiny.mp4", 2, 2, 4);
+  for (const std::string input :
+       {"missing.mp4", "empty.mp4", "garbage.mp4", "notes.txt", ".", "tiny.mp4"}) {
+    const Outcome outcome = Run("stabilize " + input + " out.mp4");
+    EXPECT_EQ(outcome.code, 3) << input;
+    ExpectOneLine(outcome, input);
+    EXPECT_FALSE(fs::exists(Path("out.mp4")));
+  }
+}
+
+TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
+  MakeClip("in.mp4", 64, 48, 5);
+  MakeFile("there.mp4", "precious");
+  fs::create_symlink("in.mp4", Path("link.mp4"));
+  for (const std::string output :
+       {"there.mp4", "in.mp4 --overwrite", "link.mp4 --overwrite", "no/such/folder.mp4",
+        "out.unknown", "out.mp4 --codec nosuch", "out.mp4 --pixel-format nosuch"}) {
+    const Outcome outcome = Run("stabilize in.mp4 " + output);
+    EXPECT_EQ(outcome.code, 4) << output;
+    ExpectOneLine(outcome, "");
+  }
+  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "there.mp4"));
+  std::ifstream kept(Path("there.mp4"));
+  EXPECT_EQ(std::string(std::istreambuf_iterator<char>(kept), {}), "precious");
+  EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet").code, 0);
+  EXPECT_EQ(ClipReader::Open(Path("there.mp4"))->info().frame_count, 5u);
+}
+
+TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
+  const struct {
+    const char* arguments;
+    const char* part;
+  } cases[] = {{"stabilise a b", "did you mean stabilize?"},
+               {"stabilize a b --smothness 3", "did you mean --smoothness?"},
+               {"stabilize a b --method perspectiv", "did you mean perspective?"},
+               {"stabilize a b --smoothness 2000", "2000"},
+               {"stabilize a b --smoothness nan", "nan"},
+               {"stabilize a b --depth 12", "12"},
+               {"stabilize a", "OUT"},
+               {"", "calmframe --help"}};
+  for (const auto& c : cases) {
+    const Outcome outcome = Run(c.arguments);
+    EXPECT_EQ(outcome.code, 2) << c.arguments;
+    ExpectOneLine(outcome, c.part);
+  }
+  EXPECT_EQ(Run("stabilize --help").code, 0);
+}
+
+TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
+  MakeClip("in.mp4", 320, 240, 90);
+  const pid_t child = fork();
+  ASSERT_GE(child, 0);
+  if (child == 0) {
+    const std::string in = Path("in.mp4");
+    const std::string out = Path("out.mp4");
+    freopen("/dev/null", "w", stderr);
+    execl(CALMFRAME_PROGRAM, "calmframe", "stabilize", in.c_str(), out.c_str(), nullptr);
+    _exit(127);
+  }
+  // The temporary output shows that the run is under way.
+  while (Files().size() < 2) usleep(1000);
+  kill(child, SIGINT);
+  int status = 0;
+  waitpid(child, &status, 0);
+  ASSERT_TRUE(WIFEXITED(status));
+  EXPECT_EQ(WEXITSTATUS(status), 130);
+  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4"));
+}
+
+TEST_F(ProgramTest, TheDemoShowsAShakyAndASteadyClip) {
+  const Outcome outcome = Run("demo here --frames 12 --quiet");
+  EXPECT_EQ(outcome.code, 0) << outcome.text;
+  const auto both = ClipReader::Open(Path("here/side-by-side.mp4"));
+  EXPECT_EQ(both->info().width, 2560);
+  EXPECT_EQ(both->info().frame_count, 12u);
+  EXPECT_EQ(ClipReader::Open(Path("here/steady.mp4"))->info().frame_count, 12u);
+}
+
+}  // namespace

@@ -1,0 +1,100 @@
+#pragma once
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "host/media/clip.h"
+
+namespace calmframe::media {
+
+// A folder of its own for each test, with small clips and their pixels.
+class ClipTest : public testing::Test {
+ protected:
+  ClipTest() {
+    std::string name = (std::filesystem::temp_directory_path() / "media-test-XXXXXX").string();
+    folder_ = mkdtemp(name.data());
+  }
+  ~ClipTest() override { std::filesystem::remove_all(folder_); }
+
+  std::string In(const std::string& name) const { return (folder_ / name).string(); }
+
+  std::size_t Files() const {
+    const std::filesystem::directory_iterator all(folder_);
+    return static_cast<std::size_t>(std::distance(begin(all), end(all)));
+  }
+
+  // What a command prints; fails the test if the command fails.
+  static std::string Run(const std::string& command) {
+    std::string text;
+    FILE* pipe = popen(command.c_str(), "r");
+    char buffer[4096];
+    while (std::size_t n = fread(buffer, 1, sizeof buffer, pipe)) text.append(buffer, n);
+    EXPECT_EQ(pclose(pipe), 0) << command;
+    return text;
+  }
+  static void Ffmpeg(const std::string& arguments) {
+    Run("ffmpeg -nostdin -y -v error " + arguments);
+  }
+  static std::string PacketHash(const std::string& path, const std::string& streams) {
+    return Run("ffmpeg -nostdin -v error -i '" + path + "' -map " + streams +
+               " -c copy -f data - | md5sum");
+  }
+
+  static ClipInfo Made(int width, int height, std::size_t frames, int bit_depth = 8) {
+    ClipInfo info;
+    info.width = width;
+    info.height = height;
+    info.frame_rate = {25, 1};
+    info.frame_count = frames;
+    info.bit_depth = bit_depth;
+    return info;
+  }
+
+  template <class Pixel>
+  static std::vector<Pixel> ReadFrame(ClipReader& reader, std::size_t frame) {
+    const ClipInfo& info = reader.info();
+    std::vector<Pixel> pixels(static_cast<std::size_t>(info.width) * info.height);
+    reader.Read(frame, pixels.data(), static_cast<std::ptrdiff_t>(sizeof(Pixel)) * info.width);
+    return pixels;
+  }
+
+  template <class Pixel>
+  static void WriteFrame(ClipWriter& writer, std::size_t frame, int width,
+                         const std::vector<Pixel>& pixels) {
+    writer.Write(frame, pixels.data(), static_cast<std::ptrdiff_t>(sizeof(Pixel)) * width);
+  }
+
+  // Line of the failure; the wrong side or none fails the test.
+  template <class Action>
+  static std::string LineOf(Failure::Side side, Action action) {
+    try {
+      action();
+    } catch (const Failure& failure) {
+      EXPECT_EQ(failure.side, side);
+      const std::string line = failure.what();
+      EXPECT_EQ(line.find('\n'), std::string::npos);
+      return line;
+    }
+    ADD_FAILURE() << "nothing was refused";
+    return {};
+  }
+
+ private:
+  std::filesystem::path folder_;
+};
+
+template <class Pixel>
+bool SamePixels(const std::vector<Pixel>& a, const std::vector<Pixel>& b) {
+  return a.size() == b.size() && std::memcmp(a.data(), b.data(), a.size() * sizeof(Pixel)) == 0;
+}
+
+}  // namespace calmframe::media

@@ -1,0 +1,117 @@
+#include "stabilizer/effect/src/solver.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cmath>
+#include <memory>
+
+#include "stabilizer/effect/src/parameter_rules.h"
+
+namespace {
+
+using marrow::stabilization::CPWarper;
+using marrow::stabilization::SolverParamsRecord;
+using marrow::tracking::AllFeatures;
+
+constexpr std::uint32_t kWidth = 640;
+constexpr std::uint32_t kHeight = 360;
+
+// Tracks of a rigid scene shaken in both directions, all alive throughout.
+AllFeatures ShakenTable(std::int32_t frames, std::int32_t slots) {
+  AllFeatures table;
+  table.feature_count = slots;
+  table.frame_count = frames;
+  for (std::int32_t f = 0; f < frames; ++f) {
+    for (std::int32_t s = 0; s < slots; ++s) {
+      table.features->push_back({static_cast<float>(20 + (s * 37) % 600 + 4 * std::sin(1.7 * f)),
+                                 static_cast<float>(20 + (s * 53) % 320 + 3 * std::cos(2.3 * f)),
+                                 f == 0 ? 1 : 0, 1.0f});
+    }
+  }
+  return table;
+}
+
+SolverParamsRecord Params() {
+  kelp::effect::ClipGeometry clip;
+  clip.width = kWidth;
+  clip.height = kHeight;
+  return MakeSolverParams({}, clip);
+}
+
+std::unique_ptr<Solver> NewSolver(const AllFeatures& table, bool needs_cropper = true,
+                                  boost::function<void()> notify = {}) {
+  return std::make_unique<Solver>(kWidth, kHeight, table, 0, Params(), needs_cropper,
+                                  std::move(notify));
+}
+
+TEST(SolverTest, FinishesWithAWarpForEveryFrameAndACropperIfAsked) {
+  for (const bool needs_cropper : {true, false}) {
+    std::atomic<int> notified{0};
+    auto solver = NewSolver(ShakenTable(60, 80), needs_cropper, [&] { ++notified; });
+    EXPECT_EQ(solver->GetState(), Solver::not_started);
+    solver->Start();
+    solver->Wait();
+    ASSERT_EQ(solver->GetState(), Solver::finished);
+    EXPECT_EQ(notified, 1);
+    EXPECT_EQ(solver->GetWarper()->frameWarpCount(), 60u);
+    EXPECT_EQ(solver->GetCropper() != nullptr, needs_cropper);
+  }
+}
+
+TEST(SolverTest, SuppliedWarperIsKeptAndNothingIsSolved) {
+  auto first = NewSolver(ShakenTable(20, 40), false);
+  first->Run();
+  ASSERT_EQ(first->GetState(), Solver::finished);
+  auto second = NewSolver(ShakenTable(20, 40));
+  second->SetExistingWarper(first->GetWarper());
+  second->Run();
+  EXPECT_EQ(second->GetState(), Solver::finished);
+  EXPECT_EQ(second->GetWarper(), first->GetWarper());
+  EXPECT_TRUE(second->GetTransitionWindows().empty());
+  EXPECT_TRUE(second->GetFactorizationWindows().empty());
+  EXPECT_TRUE(second->GetCropper());
+}
+
+TEST(SolverTest, ResultsOutliveTheSolver) {
+  auto solver = NewSolver(ShakenTable(20, 40));
+  solver->Run();
+  const auto warper = solver->GetWarper();
+  solver.reset();
+  warper->makeFrameMap(1);  // reads the tracks
+  EXPECT_EQ(warper->frameWarpCount(), 20u);
+}
+
+TEST(SolverTest, DroppingBeforeTheTaskBeginsAndWhileItRuns) {
+  const AllFeatures table = ShakenTable(200, 100);
+  for (int i = 0; i < 10; ++i) {
+    auto solver = NewSolver(table);
+    solver->Start();
+    if (i % 2 != 0) {
+      while (solver->GetProgress() < 0.05f * static_cast<float>(i)) {
+      }
+    }
+    solver.reset();
+  }
+}
+
+TEST(SolverTest, CancelledSolveEndsInItsOwnState) {
+  auto solver = NewSolver(ShakenTable(40, 40));
+  solver->Cancel();
+  solver->Run();
+  EXPECT_EQ(solver->GetState(), Solver::cancelled);
+}
+
+TEST(SolverTest, AFailureIsAStateNotAnException) {
+  // Infinite positions break the solve somewhere; where does not matter to its owner.
+  AllFeatures table = ShakenTable(40, 40);
+  for (auto& cell : *table.features) cell.x = std::nanf("");
+  std::atomic<int> notified{0};
+  auto solver = NewSolver(table, true, [&] { ++notified; });
+  solver->Start();
+  solver->Wait();
+  EXPECT_EQ(solver->GetState(), Solver::failed);
+  EXPECT_EQ(notified, 1);
+}
+
+}  // namespace

@@ -1,0 +1,263 @@
+#include "synthetic/scene.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+
+namespace synthetic {
+namespace {
+
+camera_path sliding(double metres_a_frame) {
+  const auto pose = [=](double t) { return camera_pose{{0, 0, 0}, {metres_a_frame * t, 0, 0}}; };
+  return {pose, pose};
+}
+
+struct image {
+  std::vector<HX_Pixel8> pixels;
+  int width;
+
+  double luma(int x, int y) const {
+    const HX_Pixel8& p = pixels[y * width + x];
+    return 0.3 * p.red + 0.59 * p.green + 0.11 * p.blue;
+  }
+  // By a sinc of six taps (Lanczos): bilinear interpolation would blur by the fraction and so pull
+  // a match to whole pixels.
+  double luma(point2 p) const {
+    const int x0 = static_cast<int>(std::floor(p.x)), y0 = static_cast<int>(std::floor(p.y));
+    double sum = 0, weights = 0;
+    for (int y = y0 - 2; y <= y0 + 3; ++y) {
+      for (int x = x0 - 2; x <= x0 + 3; ++x) {
+        const double w = lanczos(p.x - x) * lanczos(p.y - y);
+        sum += w * luma(x, y);
+        weights += w;
+      }
+    }
+    return sum / weights;
+  }
+
+  static double lanczos(double t) {
+    if (std::abs(t) < 1e-9) return 1;
+    return 3 * std::sin(M_PI * t) * std::sin(M_PI * t / 3) / (M_PI * M_PI * t * t);
+  }
+};
+
+image draw(const scene& world, int frame) {
+  return {world.render(frame), world.options().width};
+}
+
+constexpr int kHalf = 5;
+
+double ssd(const image& a, point2 p, const image& b, point2 q) {
+  double sum = 0;
+  for (int y = -kHalf; y <= kHalf; ++y) {
+    for (int x = -kHalf; x <= kHalf; ++x) {
+      const double d = a.luma({p.x + x, p.y + y}) - b.luma({q.x + x, q.y + y});
+      sum += d * d;
+    }
+  }
+  return sum;
+}
+
+// How far the best match lies from `q`: the lowest point of the quadric through the sums about it,
+// found twice. b is compared at whole pixels.
+point2 offset_of_match(const image& a, point2 p, const image& b, point2 q) {
+  const point2 whole = {std::round(q.x), std::round(q.y)};
+  point2 best = {0, 0};
+  for (const double step : {0.5, 0.2}) {
+    const auto at = [&](int dx, int dy) {
+      const point2 moved = {p.x + whole.x - q.x + best.x + step * dx,
+                            p.y + whole.y - q.y + best.y + step * dy};
+      return ssd(a, moved, b, whole);
+    };
+    const double c = at(0, 0);
+    const double l = at(-1, 0), r = at(1, 0), u = at(0, -1), d = at(0, 1);
+    const double gx = 0.5 * (r - l), gy = 0.5 * (d - u);
+    const double hxx = l + r - 2 * c, hyy = u + d - 2 * c;
+    const double hxy = 0.25 * (at(1, 1) - at(1, -1) - at(-1, 1) + at(-1, -1));
+    const double determinant = hxx * hyy - hxy * hxy;
+    best = {best.x + step * (hxy * gy - hyy * gx) / determinant,
+            best.y + step * (hxy * gx - hxx * gy) / determinant};
+  }
+  return best;
+}
+
+// Smaller eigenvalue of the gradient sums: whether a place can be matched at all.
+double cornerness(const image& a, int px, int py) {
+  double xx = 0, yy = 0, xy = 0;
+  for (int y = py - kHalf; y <= py + kHalf; ++y) {
+    for (int x = px - kHalf; x <= px + kHalf; ++x) {
+      const double gx = a.luma(x + 1, y) - a.luma(x - 1, y);
+      const double gy = a.luma(x, y + 1) - a.luma(x, y - 1);
+      xx += gx * gx;
+      yy += gy * gy;
+      xy += gx * gy;
+    }
+  }
+  return 0.5 * (xx + yy - std::hypot(xx - yy, 2 * xy));
+}
+
+// Whether a window holds things at different distances, which move differently: no one place is
+// right.
+bool across_outline(const scene& world, int frame, point2 p) {
+  double nearest = 1e30, farthest = 0;
+  for (int y = -kHalf - 1; y <= kHalf + 1; y += 3) {
+    for (int x = -kHalf - 1; x <= kHalf + 1; x += 3) {
+      const double depth = world.depth(frame, {p.x + x, p.y + y}).value_or(1e30);
+      nearest = std::min(nearest, depth);
+      farthest = std::max(farthest, depth);
+    }
+  }
+  return farthest > 1.15 * nearest;
+}
+
+struct match_result {
+  int count = 0;
+  double median = 0;  // distance, pixels
+};
+
+match_result match(const scene& world, int from, int to, double least_cornerness) {
+  const image a = draw(world, from), b = draw(world, to);
+  const int width = world.options().width, height = world.options().height;
+  std::vector<double> distances;
+  for (int y = 12; y < height - 12; y += 6) {
+    for (int x = 12; x < width - 12; x += 6) {
+      if (cornerness(a, x, y) < least_cornerness) continue;
+      const point2 p = {1.0 * x, 1.0 * y};
+      if (across_outline(world, from, p)) continue;
+      const auto q = world.locate(from, p, to);
+      if (!q || q->x < 12 || q->y < 12 || q->x > width - 13 || q->y > height - 13) continue;
+      const point2 off = offset_of_match(a, p, b, *q);
+      distances.push_back(std::hypot(off.x, off.y));
+    }
+  }
+  if (distances.empty()) return {};
+  std::sort(distances.begin(), distances.end());
+  return {static_cast<int>(distances.size()), distances[distances.size() / 2]};
+}
+
+TEST(SceneTruthTest, ASlidingCameraBeforeAWall) {
+  const scene world(wall(8), sliding(0.05), {.width = 320, .height = 180, .field_of_view = 1.0});
+  const double focal = 160 / std::tan(0.5);
+  const auto q = world.locate(2, {200, 71}, 12);
+  ASSERT_TRUE(q);
+  EXPECT_NEAR(q->x, 200 - focal * 0.5 / 8, 1e-9);
+  EXPECT_NEAR(q->y, 71, 1e-9);
+  EXPECT_NEAR(*world.depth(2, {200, 71}), 8, 1e-9);
+  EXPECT_FALSE(world.locate(0, {5, 71}, 12)) << "out of the frame";
+}
+
+TEST(SceneTruthTest, ABoardHidesWhatIsBehindIt) {
+  std::vector<surface> both = wall(8);
+  both.push_back({{-1, -0.5, 4}, {1, 0, 0}, {0, 1, 0}, 2, 1, material::facade, 2, 2});
+  const scene world(both, sliding(0.1), {.width = 320, .height = 180, .field_of_view = 1.0});
+  EXPECT_NEAR(*world.depth(0, {159.5, 89.5}), 4, 1e-9);
+  const double focal = 160 / std::tan(0.5);
+  // From the middle outward: the board ends 1 / 4 of the focal length out.
+  EXPECT_NEAR(*world.depth(0, {159.5 + focal / 4 + 1, 89.5}), 8, 1e-9);
+  EXPECT_NEAR(*world.depth(0, {159.5 + focal / 4 - 1, 89.5}), 4, 1e-9);
+  // After a metre to the left the wall just right of the board has gone behind it.
+  EXPECT_FALSE(world.locate(10, {159.5 + 1, 89.5}, 0));
+  EXPECT_TRUE(world.locate(0, {159.5 - focal / 4 + 1, 89.5}, 5)) << "the board's own edge stays";
+}
+
+TEST(SceneTruthTest, PicturesShowThingsWhereTheTruthSays) {
+  const scene flat(wall(8), sliding(0.0037), {.width = 320, .height = 180, .field_of_view = 1.0});
+  const match_result planar = match(flat, 0, 10, 1e4);
+  EXPECT_GT(planar.count, 20);
+  EXPECT_LT(planar.median, 0.03);
+
+  for (const double readout : {0.0, 0.8}) {
+    const scene deep(street(1), handheld_path({}),
+                     {.width = 480, .height = 270, .readout = readout});
+    const match_result walk = match(deep, 20, 21, 4e4);
+    EXPECT_GT(walk.count, 60);
+    EXPECT_LT(walk.median, 0.04) << "readout " << readout;
+  }
+}
+
+TEST(SceneTest, TheSameWorldGivesTheSameBytesAtAnyStride) {
+  scene_options options = {.width = 101,
+                           .height = 53,
+                           .readout = 0.5,
+                           .noise = 2,
+                           .gain = 0.1,
+                           .bias = 4,
+                           .occluder = true};
+  const scene world(street(3), handheld_path({}), options);
+  const auto frame = world.render(7);
+  std::vector<HX_Pixel8> wide(128 * 53, HX_Pixel8{9, 9, 9, 9});
+  scene(street(3), handheld_path({}), options).render(7, wide.data(), 128);
+  for (int y = 0; y < 53; ++y) {
+    ASSERT_EQ(std::memcmp(&frame[y * 101], &wide[y * 128], 101 * sizeof(HX_Pixel8)), 0) << y;
+    ASSERT_EQ(wide[y * 128 + 101].alpha, 9);
+  }
+  options.seed = 2;
+  const auto other = scene(street(3), handheld_path({}), options).render(7);
+  EXPECT_NE(std::memcmp(frame.data(), other.data(), frame.size() * sizeof(HX_Pixel8)), 0);
+  for (const HX_Pixel8& p : frame) ASSERT_EQ(p.alpha, 255);
+}
+
+TEST(SceneTest, RowsAreReadAtTheirTime) {
+  const scene_options rolling = {.width = 160, .height = 90, .readout = 1.0};
+  const scene world(street(1), handheld_path({}), rolling);
+  const auto frame = world.render(5);
+  scene_options global = rolling;
+  global.readout = 0;
+  for (const int y : {0, 17, 55, 89}) {
+    camera_path later = handheld_path({});
+    later.shaken = [shaken = later.shaken, y](double t) { return shaken(t + y / 89.0); };
+    const auto still = scene(street(1), later, global).render(5);
+    int differ = 0;
+    for (int x = 0; x < 160; ++x) {
+      differ += std::memcmp(&frame[y * 160 + x], &still[y * 160 + x], sizeof(HX_Pixel8)) != 0;
+    }
+    // Pixels at outlines are told by the rows above and below, which have other times.
+    EXPECT_LT(differ, 24) << "row " << y;
+  }
+}
+
+TEST(SceneTest, GainAndNoiseSpareTheGeometryAndTheFirstFrame) {
+  const scene_options plain = {.width = 160, .height = 90};
+  scene_options changed = plain;
+  changed.gain = 0.2;
+  changed.bias = 10;
+  const scene a(wall(8), sliding(0), plain), b(wall(8), sliding(0), changed);
+  const auto same = a.render(0), first = b.render(0);
+  EXPECT_EQ(std::memcmp(same.data(), first.data(), same.size() * sizeof(HX_Pixel8)), 0);
+  // Every unclipped value of frame 3 is one straight line of the plain one.
+  const auto p = a.render(3), q = b.render(3);
+  double n = 0, sx = 0, sy = 0, sxx = 0, sxy = 0;
+  for (std::size_t i = 0; i < p.size(); ++i) {
+    if (p[i].green > 200 || p[i].green < 20) continue;
+    n += 1, sx += p[i].green, sy += q[i].green;
+    sxx += p[i].green * p[i].green, sxy += p[i].green * q[i].green;
+  }
+  const double slope = (n * sxy - sx * sy) / (n * sxx - sx * sx);
+  EXPECT_NE(slope, 1.0);
+  EXPECT_NEAR(slope, 1.0, 0.21);
+  scene_options noisy = plain;
+  noisy.noise = 3;
+  const auto r = scene(wall(8), sliding(0), noisy).render(3);
+  double square = 0;
+  int count = 0;
+  for (std::size_t i = 0; i < p.size(); ++i) {
+    if (p[i].green > 235 || p[i].green < 20) continue;
+    square += (r[i].green - p[i].green) * (r[i].green - p[i].green);
+    ++count;
+  }
+  EXPECT_NEAR(std::sqrt(square / count), 3.0, 0.15);
+}
+
+TEST(SceneTest, TheOccluderHidesTheSceneInPassing) {
+  scene_options options = {.width = 160, .height = 90, .frame_count = 60, .occluder = true};
+  const scene world(wall(20), resting_path({}), options);
+  EXPECT_NEAR(*world.depth(30, {79.5, 50}), 4, 1e-9);
+  EXPECT_FALSE(world.locate(0, {79.5, 50}, 30)) << "hidden";
+  EXPECT_FALSE(world.locate(30, {79.5, 50}, 0)) << "the occluder itself has no truth";
+  EXPECT_TRUE(world.locate(0, {79.5, 50}, 59)) << "free again";
+}
+
+}  // namespace
+}  // namespace synthetic

@@ -1,0 +1,99 @@
+#include "tracking/gaussian_smoothing.h"
+
+#include <gmock/gmock.h>
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <random>
+#include <vector>
+
+namespace marrow::tracking {
+namespace {
+
+TEST(IntegratedGaussianTest, WorkedTaps) {
+  const struct {
+    int window;  // sigma is a tenth of it, the tenth in 32 bits
+    std::size_t radius;
+    std::vector<double> taps;  // from the middle outwards
+  } cases[] = {
+      {15, 5, {0.261181504, 0.210837901, 0.110892154, 0.03798436, 0.00846751221, 0.00122733344}},
+      {31,
+       11,
+       {0.128161848, 0.121718906, 0.10426911, 0.0805658549, 0.0561491325, 0.035296388, 0.0200129393,
+        0.0102348765, 0.00472109579, 0.00196421263, 0.000737082795, 0.000249472389}},
+      {41, 14, {0.0971017033}},
+      {11, 4, {0.350578785}},
+  };
+  for (const auto& c : cases) {
+    const std::vector<float> kernel = IntegratedGaussian(c.window * static_cast<double>(0.1f));
+    ASSERT_EQ(kernel.size(), 2 * c.radius + 1);
+    for (std::size_t k = 0; k < c.taps.size(); ++k) {
+      EXPECT_NEAR(kernel[c.radius + k] / c.taps[k], 1.0, 1e-7) << c.window << ' ' << k;
+      EXPECT_EQ(kernel[c.radius + k], kernel[c.radius - k]);
+    }
+  }
+}
+
+TEST(IntegratedGaussianTest, NarrowerThanAPixelIsTheIdentity) {
+  EXPECT_THAT(IntegratedGaussian(0.011), ::testing::ElementsAre(1.0f));
+}
+
+// Edge pixels of the region repeat; middle tap first, then pairs outwards.
+std::vector<float> PlainSmoothing(std::vector<float> image, int stride, const PixelRegion& r,
+                                  const std::vector<float>& kernel) {
+  const int radius = kernel.size() / 2;
+  for (const bool along_x : {true, false}) {
+    const std::vector<float> source = image;
+    for (int y = r.y0; y < int(r.y1); ++y) {
+      for (int x = r.x0; x < int(r.x1); ++x) {
+        const auto at = [&](int k) {
+          const int column = along_x ? std::clamp<int>(x + k, r.x0, r.x1 - 1) : x;
+          const int row = along_x ? y : std::clamp<int>(y + k, r.y0, r.y1 - 1);
+          return source[row * stride + column];
+        };
+        float sum = kernel[radius] * at(0);
+        for (int k = 1; k <= radius; ++k) sum += kernel[radius + k] * (at(-k) + at(k));
+        image[y * stride + x] = sum;
+      }
+    }
+  }
+  return image;
+}
+
+TEST(SeparableSmootherTest, EqualsThePlainLoopsBitForBitInsideItsRegionOnly) {
+  constexpr float kNaN = std::numeric_limits<float>::quiet_NaN();
+  std::mt19937 random(5);
+  std::uniform_real_distribution<float> value(0.0f, 255.0f);
+  for (const double sigma : {0.1, 0.7, 2.1}) {
+    const std::vector<float> kernel = IntegratedGaussian(sigma);
+    for (const std::size_t width : {1u, 2u, 15u, 16u, 17u, 63u, 64u, 65u, 130u}) {
+      SeparableSmoother smoother(kernel, width);
+      for (const std::size_t height : {1u, 3u, 30u}) {
+        // The region stands in a field of NaN, which would spread if it were read.
+        const std::size_t stride = width + 5;
+        const PixelRegion region{2, 1, 2 + width, 1 + height};
+        std::vector<float> image(stride * (height + 2), kNaN);
+        for (std::size_t y = region.y0; y < region.y1; ++y) {
+          for (std::size_t x = region.x0; x < region.x1; ++x) image[y * stride + x] = value(random);
+        }
+        const std::vector<float> expected = PlainSmoothing(image, stride, region, kernel);
+        smoother.Smooth(image.data(), stride, region);
+        for (std::size_t i = 0; i < image.size(); ++i) {
+          ASSERT_TRUE(image[i] == expected[i] || (std::isnan(image[i]) && std::isnan(expected[i])))
+              << width << "x" << height << " at " << i % stride << "," << i / stride;
+        }
+      }
+    }
+  }
+}
+
+TEST(SeparableSmootherTest, AConstantImageStaysExactlyConstant) {
+  std::vector<float> image(67 * 41, 201.0f);
+  SeparableSmoother(IntegratedGaussian(3.1), 67).Smooth(image.data(), 67, {0, 0, 67, 41});
+  EXPECT_THAT(image, ::testing::Each(image[0]));
+  EXPECT_NEAR(image[0], 201.0f, 1e-3f);
+}
+
+}  // namespace
+}  // namespace marrow::tracking

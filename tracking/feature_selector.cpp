@@ -1,0 +1,176 @@
+#include "tracking/feature_selector.h"
+
+#include <algorithm>
+#include <cmath>
+#include <utility>
+
+#include "tracking/corner_score.h"
+
+namespace marrow::tracking {
+namespace {
+
+// Lengths in a damaged record may be anything; beyond this they mean "more than any image".
+constexpr std::uint64_t kLongest = std::uint64_t{1} << 30;
+
+// The image without a strip of `inset` pixels along each edge.
+PixelRegion Inset(std::size_t width, std::size_t height, std::uint64_t inset_x,
+                  std::uint64_t inset_y) {
+  PixelRegion region{inset_x, inset_y, 0, 0};
+  if (width > inset_x) region.x1 = width - inset_x;
+  if (height > inset_y) region.y1 = height - inset_y;
+  return region;
+}
+
+std::uint64_t AtLeastZero(std::uint64_t from, std::uint64_t taken) {
+  return from > taken ? from - taken : 0;
+}
+
+}  // namespace
+
+FeatureSelector::FeatureSelector(const SelectorParams& params) : params_(params) {
+  params_.half_winx = std::min(params_.half_winx, kLongest);
+  params_.half_winy = std::min(params_.half_winy, kLongest);
+  params_.border = std::min(params_.border, kLongest);
+}
+
+void FeatureSelector::Configure(std::size_t width, std::size_t height) {
+  width_ = width;
+  height_ = height;
+  // A longer distance covers the whole image from any pixel just as well.
+  spacing_ = std::min<std::uint64_t>(params_.spacing, width + height);
+  luma_.assign(width * height, 0.0f);
+  mask_.assign(width * height, 0);
+  available_.resize(width * height);
+
+  // Gradients are taken on the image inset by the border less the window and 2 pixels of margin;
+  // scores where the window, and one pixel more, fits into that.
+  const std::uint64_t gradient_x = AtLeastZero(params_.border, params_.half_winx + 2);
+  const std::uint64_t gradient_y = AtLeastZero(params_.border, params_.half_winy + 2);
+  scoring_region_ =
+      Inset(width, height, gradient_x + params_.half_winx + 1, gradient_y + params_.half_winy + 1);
+  smoother_.reset();
+  gradient_sums_.reset();
+  if (scoring_region_.empty()) return;
+
+  gradient_sums_ = std::make_unique<GradientSums>(params_.half_winx, params_.half_winy, width);
+  score_rows_.resize(3 * (scoring_region_.x1 - scoring_region_.x0));
+  maxima_.reserve(width);
+  if (params_.presmoothing && params_.presmooth_factor > 0.0f) {
+    const std::uint64_t longer = std::max(params_.half_winx, params_.half_winy);
+    const double sigma = std::min(static_cast<double>(2 * longer + 1) * params_.presmooth_factor,
+                                  static_cast<double>(std::max(width, height)));
+    std::vector<float> kernel = IntegratedGaussian(sigma);
+    const std::uint64_t radius = kernel.size() / 2;
+    smoothing_region_ =
+        Inset(width, height, AtLeastZero(gradient_x, radius), AtLeastZero(gradient_y, radius));
+    smoother_ = std::make_unique<SeparableSmoother>(std::move(kernel), width);
+  }
+}
+
+FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
+  candidates.clear();
+  const PixelRegion& region = scoring_region_;
+  if (region.empty()) return {};
+  if (smoother_) smoother_->Smooth(luma_.data(), width_, smoothing_region_);
+
+  // A score's neighbours all lie in the scoring region, whose outermost pixels are never
+  // candidates. Three rows of scores are kept, so each is still in the cache when it is compared.
+  const std::size_t columns = region.x1 - region.x0;
+  const auto score_row = [&](std::size_t y) { return score_rows_.data() + y % 3 * columns; };
+  float best = -100000.0f;
+  gradient_sums_->Start(luma_.data(), width_, region);
+  for (std::size_t y = region.y0; y < region.y1; ++y) {
+    ScoreRow(gradient_sums_->NextRow(), columns, params_.eig_ratio_threshold, score_row(y));
+    if (y < region.y0 + 2) continue;
+    const float* scores = score_row(y - 1);
+    maxima_.clear();
+    FindMaxima(score_row(y - 2), scores, score_row(y), columns, maxima_);
+    for (const std::uint32_t x : maxima_) {
+      const std::size_t pixel = (y - 1) * width_ + region.x0 + x;
+      if (mask_[pixel] == 0) continue;
+      candidates.push_back({static_cast<std::uint32_t>(pixel), scores[x]});
+      best = std::max(best, scores[x]);
+    }
+  }
+  if (best < 0.0f) {
+    candidates.clear();
+    return {};
+  }
+
+  const float area = static_cast<float>((2 * params_.half_winx + 1) * (2 * params_.half_winy + 1));
+  const float cap = std::min(best, params_.max_eig * area);
+  const float limit = std::max(params_.threshold * cap, params_.min_eig * area);
+  std::erase_if(candidates, [limit](const Candidate& c) { return c.score < limit; });
+  if (candidates.empty()) return {};
+  std::sort(candidates.begin(), candidates.end(), [](const Candidate& a, const Candidate& b) {
+    return a.score != b.score ? a.score > b.score : a.pixel < b.pixel;
+  });
+  return {candidates.front().score / area, candidates.back().score / area};
+}
+
+void FeatureSelector::SelectFirst() {
+  SelectAvoiding(nullptr, 0);
+}
+
+void FeatureSelector::SelectAvoiding(const tracking_feature<float>* live_features,
+                                     std::size_t count, std::size_t limit) {
+  std::fill(available_.begin(), available_.end(), std::uint8_t{1});
+  for (std::size_t s = 0; s < count; ++s) {
+    const auto& cell = live_features[s];
+    if (cell.status >= 0) ClearDiscAroundFeature(cell.x, cell.y);
+  }
+  Select(static_cast<std::size_t>(std::min<std::uint64_t>(limit, params_.max_count)));
+}
+
+void FeatureSelector::Select(std::size_t limit) {
+  selected.clear();
+  for (const Candidate& candidate : candidates) {
+    if (selected.size() >= limit) return;
+    if (available_[candidate.pixel] == 0) continue;
+    const std::size_t column = candidate.pixel % width_;
+    const std::size_t row = candidate.pixel / width_;
+    selected.push_back({static_cast<float>(column), static_cast<float>(row), candidate.score});
+    if (selected.size() == limit) return;
+    ClearDiscAroundCandidate(static_cast<std::int64_t>(column), static_cast<std::int64_t>(row));
+  }
+}
+
+void FeatureSelector::ClearDiscAroundFeature(float x, float y) {
+  if (!std::isfinite(x) || !std::isfinite(y)) return;
+  const float radius = static_cast<float>(spacing_);
+  // Clamped before the cast: a tracked position may lie anywhere.
+  const float first_row = std::max(std::ceil(y - radius), 0.0f);
+  const float last_row = std::min(std::floor(y + radius), static_cast<float>(height_) - 1.0f);
+  if (!(first_row <= last_row)) return;
+  for (auto row = static_cast<std::int64_t>(first_row); row <= static_cast<std::int64_t>(last_row);
+       ++row) {
+    const float dy = static_cast<float>(row) - y;
+    const float chord = std::sqrt(std::max(radius * radius - dy * dy, 0.0f));
+    const float first = std::max(std::ceil(x - chord), 0.0f);
+    const float last = std::min(std::floor(x + chord), static_cast<float>(width_) - 1.0f);
+    if (!(first <= last)) continue;
+    ClearSpan(row, static_cast<std::int64_t>(first), static_cast<std::int64_t>(last));
+  }
+}
+
+void FeatureSelector::ClearDiscAroundCandidate(std::int64_t column, std::int64_t row) {
+  const auto radius = static_cast<std::int64_t>(spacing_);
+  const std::int64_t first_row = std::max<std::int64_t>(row - radius, 0);
+  const std::int64_t last_row = std::min(row + radius, static_cast<std::int64_t>(height_) - 1);
+  for (std::int64_t y = first_row; y <= last_row; ++y) {
+    const std::int64_t dy = y - row;
+    const auto chord =
+        static_cast<std::int64_t>(std::sqrt(static_cast<double>(radius * radius - dy * dy)));
+    ClearSpan(y, std::max<std::int64_t>(column - chord, 0),
+              std::min(column + chord, static_cast<std::int64_t>(width_) - 1));
+  }
+}
+
+// Columns first to last, both included.
+void FeatureSelector::ClearSpan(std::int64_t row, std::int64_t first, std::int64_t last) {
+  std::fill(available_.begin() + row * static_cast<std::int64_t>(width_) + first,
+            available_.begin() + row * static_cast<std::int64_t>(width_) + last + 1,
+            std::uint8_t{0});
+}
+
+}  // namespace marrow::tracking

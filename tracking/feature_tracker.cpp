@@ -1,0 +1,217 @@
+#include "tracking/feature_tracker.h"
+
+#include <algorithm>
+#include <limits>
+
+#include "tracking/affine_solver.h"
+#include "tracking/pyramid_search.h"
+
+namespace marrow::tracking {
+namespace {
+
+level_image LevelOf(const ImagePyramid& pyramid, std::size_t level) {
+  return {pyramid.LevelData(level), pyramid.LevelWidth(level), pyramid.LevelHeight(level)};
+}
+
+void Count(std::vector<std::size_t>& histogram, std::size_t counter) {
+  if (counter < histogram.size()) ++histogram[counter];
+}
+
+}  // namespace
+
+// Most features are found on the finest level alone, so levels of the template are sampled and
+// their matrices formed when an attempt first reaches them.
+struct FeatureTracker::translation_stage {
+  FeatureTracker& tracker;
+  const ImagePyramid& previous;
+  const ImagePyramid& current;
+  float x, y;
+  color_mode mode;
+  std::size_t levels_sampled = 0;
+  bool prepared = false;
+  std::size_t prepared_level = 0;
+  bool singular = false;
+
+  void SampleTo(std::size_t level) {
+    for (; levels_sampled <= level; ++levels_sampled) {
+      ExtractWindowLevel(levels_sampled, x, y, previous, tracker.translation_stack_,
+                         tracker.scratch_.data());
+    }
+  }
+
+  int Solve(std::size_t level, AffineState& state) {
+    SampleTo(level);
+    const template_planes planes = tracker.translation_stack_.Level(level);
+    if (!prepared || prepared_level != level) {
+      prepared = true;
+      prepared_level = level;
+      singular = !PrepareTranslation(planes, tracker.offsets(), tracker.shape_, mode,
+                                     tracker.translation_normal_);
+    }
+    if (singular) return kLevelFailed;
+    return SolveTranslation(planes, tracker.shape_, tracker.translation_normal_,
+                            LevelOf(current, level), mode, tracker.tolerances_,
+                            tracker.max_iterations_, state, tracker.window_.data());
+  }
+
+  float Correlation(std::size_t level) {
+    return NormalisedCorrelation(tracker.shape_, tracker.translation_stack_.Level(level).t,
+                                 tracker.window_.data());
+  }
+};
+
+struct FeatureTracker::affine_stage {
+  FeatureTracker& tracker;
+  const ImagePyramid& current;
+  feature_slot& slot;
+  color_mode mode;
+
+  int Solve(std::size_t level, AffineState& state) {
+    if (mode != color_mode::none && mode != color_mode::joint) return kLevelFailed;
+    affine_level& cached = slot.levels[level];
+    const template_planes planes = slot.stack.Level(level);
+    if (cached.normal_state == readiness::unknown) {
+      cached.normal_state = PrepareAffine(planes, tracker.offsets(), tracker.shape_,
+                                          mode == color_mode::joint, cached.normal)
+                                ? readiness::ready
+                                : readiness::singular;
+    }
+    if (cached.normal_state == readiness::singular) return kLevelFailed;
+    return SolveAffine(planes, tracker.offsets(), tracker.shape_, cached.normal,
+                       LevelOf(current, level), mode, tracker.tolerances_, tracker.max_iterations_,
+                       state, tracker.window_.data());
+  }
+
+  float Correlation(std::size_t level) {
+    affine_level& cached = slot.levels[level];
+    const float* t = slot.stack.Level(level).t;
+    if (!cached.has_moments) {
+      cached.moments = ChannelMoments(t, tracker.shape_);
+      cached.has_moments = true;
+    }
+    return NormalisedCorrelation(tracker.shape_, t, cached.moments, tracker.window_.data());
+  }
+};
+
+FeatureTracker::FeatureTracker(const TrackerParams& params, std::size_t feature_count,
+                               std::size_t channels)
+    : levels_(params.pyramidal_levels),
+      max_iterations_(static_cast<int>(
+          std::min<std::uint64_t>(params.max_iterations, std::numeric_limits<int>::max()))),
+      verification_(params.affine_verification),
+      translation_mode_(static_cast<color_mode>(params.color_correction_translation)),
+      affine_mode_(static_cast<color_mode>(params.color_correction_affine)),
+      min_correlation_(static_cast<float>(params.tolerance_min_correlation)),
+      dark_threshold_(static_cast<float>(params.tolerance_primary_color_threshold)),
+      tolerances_{static_cast<float>(params.tolerance_translation),
+                  static_cast<float>(params.tolerance_affine),
+                  static_cast<float>(params.tolerance_color_lambda),
+                  static_cast<float>(params.tolerance_color_delta)},
+      shape_{params.half_win_x, params.half_win_x, channels},
+      offset_u_(shape_.plane_size()),
+      offset_v_(shape_.plane_size()),
+      scratch_(WindowScratchSize(shape_)),
+      window_(shape_.plane_size()),
+      translation_stack_(shape_.half_x, shape_.half_y, channels, levels_) {
+  for (std::size_t i = 0; i < shape_.samples(); ++i) {
+    const std::size_t pixel = i / channels;
+    offset_u_[i] = static_cast<float>(pixel % shape_.columns()) - static_cast<float>(shape_.half_x);
+    offset_v_[i] = static_cast<float>(pixel / shape_.columns()) - static_cast<float>(shape_.half_y);
+  }
+  if (!verification_) return;
+  slots_.resize(feature_count);
+  for (feature_slot& slot : slots_) {
+    slot.stack = WindowStack(shape_.half_x, shape_.half_y, channels, levels_);
+    slot.levels.resize(levels_);
+  }
+}
+
+void FeatureTracker::TrackFeatures(const ImagePyramid& previous, const ImagePyramid& current,
+                                   const tracking_feature<float>* previous_row,
+                                   tracking_feature<float>* current_row, std::size_t feature_count,
+                                   TrackingStatistics& statistics) {
+  for (std::size_t s = 0; s < feature_count; ++s) {
+    if (previous_row[s].status < 0) {
+      current_row[s].status = feature_status::kEmpty;
+    } else if (TrackFeature(previous, current, previous_row[s], current_row[s], statistics)) {
+      current_row[s].status = feature_status::kTracked;
+    } else {
+      current_row[s].status = feature_status::kLost;
+      Count(statistics.translation, 0);
+    }
+  }
+}
+
+bool FeatureTracker::TrackFeature(const ImagePyramid& previous, const ImagePyramid& current,
+                                  const tracking_feature<float>& from, tracking_feature<float>& to,
+                                  TrackingStatistics& statistics) {
+  WindowStack& stack = translation_stack_;
+  stack.levels_built = CountWindowLevels(levels_, from.x, from.y, shape_, previous);
+  if (stack.levels_built == 0) return false;
+  translation_stage stage{*this, previous, current, from.x, from.y, translation_mode_};
+  stage.SampleTo(0);
+  float limit = min_correlation_;
+  if (FindPrimaryChannel(stack.Level(0).t, shape_, dark_threshold_) != 0) {
+    stage.mode = color_mode::none;
+    limit = kAnyCorrelation;
+  }
+  AffineState state(from.x, from.y);
+  const search_result result =
+      SearchPyramid(stage, stack.levels_built, limit, max_iterations_, state);
+  if (!result.found()) return false;
+  Count(statistics.translation, static_cast<std::size_t>(result.start_level) + 1);
+  to.x = from.x + state.dx;
+  to.y = from.y + state.dy;
+  return true;
+}
+
+void FeatureTracker::InitialiseSeeds(const ImagePyramid& current,
+                                     const tracking_feature<float>* row) {
+  for (std::size_t s = 0; s < slots_.size(); ++s) {
+    if (row[s].status <= 0) continue;
+    feature_slot& slot = slots_[s];
+    ExtractWindowStack(levels_, row[s].x, row[s].y, current, slot.stack, scratch_.data());
+    for (affine_level& level : slot.levels) {
+      level.normal_state = readiness::unknown;
+      level.has_moments = false;
+    }
+    slot.primary_channel = slot.stack.levels_built == 0
+                               ? 0
+                               : FindPrimaryChannel(slot.stack.Level(0).t, shape_, dark_threshold_);
+    slot.state = AffineState(row[s].x, row[s].y);
+  }
+}
+
+void FeatureTracker::VerifyFeatures(const ImagePyramid& current, tracking_feature<float>* row,
+                                    TrackingStatistics& statistics) {
+  for (std::size_t s = 0; s < slots_.size(); ++s) {
+    tracking_feature<float>& cell = row[s];
+    if (cell.status != feature_status::kTracked) continue;
+    feature_slot& slot = slots_[s];
+    slot.state.dx = cell.x - slot.state.x;
+    slot.state.dy = cell.y - slot.state.y;
+    const float limit = slot.primary_channel != 0 ? kAnyCorrelation : min_correlation_;
+    if (VerifyFeature(current, slot, limit, cell, statistics)) continue;
+    cell.status =
+        limit > cell.correlation ? feature_status::kRejectedCorrelation : feature_status::kRejected;
+    Count(statistics.verification, 0);
+  }
+}
+
+bool FeatureTracker::VerifyFeature(const ImagePyramid& current, feature_slot& slot, float limit,
+                                   tracking_feature<float>& cell, TrackingStatistics& statistics) {
+  affine_stage stage{*this, current, slot,
+                     slot.primary_channel != 0 ? color_mode::none : affine_mode_};
+  const search_result result = SearchPyramid(
+      stage, std::min(slot.stack.levels_built, current.levels), limit, max_iterations_, slot.state);
+  if (!result.found()) return false;
+  cell.correlation = result.start_level == 0 && result.correlation_tested ? result.correlation
+                                                                          : stage.Correlation(0);
+  if (cell.correlation < limit) return false;
+  Count(statistics.verification, static_cast<std::size_t>(result.start_level) + 1);
+  cell.x = slot.state.x + slot.state.dx;
+  cell.y = slot.state.y + slot.state.dy;
+  return true;
+}
+
+}  // namespace marrow::tracking

@@ -1,0 +1,89 @@
+#pragma once
+
+#include <cstddef>
+#include <vector>
+
+#include "tracking/affine_state.h"
+#include "tracking/correlation.h"
+#include "tracking/image_pyramid.h"
+#include "tracking/packed_cholesky.h"
+#include "tracking/track_store.h"
+#include "tracking/tracker_params.h"
+#include "tracking/tracking_run.h"
+#include "tracking/translation_solver.h"
+#include "tracking/window_stack.h"
+
+namespace marrow::tracking {
+
+// Carries features from frame to frame (Lucas and Kanade 1981, in the inverse-compositional form of
+// Baker and Matthews 2004), then judges each against the window it showed in its first frame
+// (Shi and Tomasi 1994), so that the errors of the steps do not add up. Windows are square, of
+// half_win_x. One thread; everything is allocated at construction. Rows are feature_count cells of
+// the track table.
+class FeatureTracker {
+ public:
+  FeatureTracker(const TrackerParams& params, std::size_t feature_count, std::size_t channels);
+
+  // For each feature that lives in previous_row, writes x, y and status kTracked to current_row,
+  // or status kLost; for the other slots status kEmpty. Counts into statistics.translation.
+  void TrackFeatures(const ImagePyramid& previous, const ImagePyramid& current,
+                     const tracking_feature<float>* previous_row,
+                     tracking_feature<float>* current_row, std::size_t feature_count,
+                     TrackingStatistics& statistics);
+
+  // Keeps what the slots of all seeds (status above 0) show in their first frame.
+  void InitialiseSeeds(const ImagePyramid& current, const tracking_feature<float>* row);
+
+  // For each cell with status kTracked, matches the slot's first window against this frame,
+  // starting at the cell's position with the warp and colours of the frame before. Writes x, y and
+  // correlation, or status kRejected (the correlation in the cell is not under the limit) or
+  // kRejectedCorrelation. Counts into statistics.verification.
+  void VerifyFeatures(const ImagePyramid& current, tracking_feature<float>* row,
+                      TrackingStatistics& statistics);
+
+  const AffineState& state(std::size_t slot) const { return slots_[slot].state; }
+
+ private:
+  // What depends on one level of a template alone, computed when it is first needed.
+  enum class readiness : unsigned char { unknown, ready, singular };
+  struct affine_level {
+    readiness normal_state = readiness::unknown;
+    bool has_moments = false;
+    channel_moments moments;
+    packed_cholesky normal;
+  };
+  struct feature_slot {
+    WindowStack stack;
+    std::vector<affine_level> levels;
+    std::size_t primary_channel = 0;
+    AffineState state;
+  };
+  struct translation_stage;
+  struct affine_stage;
+
+  bool TrackFeature(const ImagePyramid& previous, const ImagePyramid& current,
+                    const tracking_feature<float>& from, tracking_feature<float>& to,
+                    TrackingStatistics& statistics);
+  bool VerifyFeature(const ImagePyramid& current, feature_slot& slot, float limit,
+                     tracking_feature<float>& cell, TrackingStatistics& statistics);
+  offset_planes offsets() const { return {offset_u_.data(), offset_v_.data()}; }
+
+  std::size_t levels_;
+  int max_iterations_;
+  bool verification_;
+  color_mode translation_mode_;
+  color_mode affine_mode_;
+  float min_correlation_;
+  float dark_threshold_;
+  solver_tolerances tolerances_;
+  window_shape shape_;
+  std::vector<float> offset_u_;
+  std::vector<float> offset_v_;
+  std::vector<float> scratch_;
+  std::vector<float> window_;  // the last sample
+  WindowStack translation_stack_;
+  translation_normal translation_normal_;  // of the level that was last prepared
+  std::vector<feature_slot> slots_;        // empty without verification
+};
+
+}  // namespace marrow::tracking

@@ -1,0 +1,125 @@
+#include "tracking/frame_preparation.h"
+
+#include <bit>
+#include <cstring>
+
+#undef HWY_TARGET_INCLUDE
+#define HWY_TARGET_INCLUDE "tracking/frame_preparation.cpp"
+#include <hwy/foreach_target.h>
+#include <hwy/highway.h>
+
+HWY_BEFORE_NAMESPACE();
+namespace marrow::tracking {
+namespace HWY_NAMESPACE {
+namespace hn = hwy::HWY_NAMESPACE;
+
+// A pixel is taken as one 32-bit lane: alpha in the lowest byte, then red, green, blue.
+static_assert(std::endian::native == std::endian::little);
+
+using Pixels = hn::ScalableTag<std::int32_t>;
+using Floats = hn::ScalableTag<float>;
+
+template <class V>
+HWY_INLINE V Red(V pixels) {
+  return hn::And(hn::ShiftRight<8>(pixels), hn::Set(Pixels(), 255));
+}
+template <class V>
+HWY_INLINE V Green(V pixels) {
+  return hn::And(hn::ShiftRight<16>(pixels), hn::Set(Pixels(), 255));
+}
+template <class V>
+HWY_INLINE V Blue(V pixels) {
+  return hn::And(hn::ShiftRight<24>(pixels), hn::Set(Pixels(), 255));
+}
+HWY_INLINE auto LoadPixels(const std::uint8_t* row, std::size_t x) {
+  const Pixels d;
+#if HWY_TARGET == HWY_SCALAR  // one lane, which has no room for four bytes
+  std::int32_t pixel;
+  std::memcpy(&pixel, row + 4 * x, sizeof(pixel));
+  return hn::Set(d, pixel);
+#else
+  const hn::Repartition<std::uint8_t, Pixels> bytes;
+  return hn::BitCast(d, hn::LoadU(bytes, row + 4 * x));
+#endif
+}
+
+void LumaRows(const ArgbFrame& frame, float* luma) {
+  const Pixels d;
+  const Floats df;
+  const std::size_t N = hn::Lanes(d);
+  for (std::size_t y = 0; y < frame.height; ++y, luma += frame.width) {
+    const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
+    std::size_t x = 0;
+    for (; x + N <= frame.width; x += N) {
+      const auto pixels = LoadPixels(row, x);
+      const auto red_green = hn::Add(hn::Mul(Red(pixels), hn::Set(d, 9798)),
+                                     hn::Mul(Green(pixels), hn::Set(d, 19235)));
+      const auto blue_half = hn::Add(hn::Mul(Blue(pixels), hn::Set(d, 3735)), hn::Set(d, 16384));
+      const auto sum = hn::ShiftRight<15>(hn::Add(red_green, blue_half));
+      hn::StoreU(hn::ConvertTo(df, sum), df, luma + x);
+    }
+    for (; x < frame.width; ++x) {
+      const std::uint8_t* p = row + 4 * x;
+      luma[x] = static_cast<float>((9798 * p[1] + 19235 * p[2] + 3735 * p[3] + 16384) >> 15);
+    }
+  }
+}
+
+void MaskRows(const ArgbFrame& frame, std::uint8_t* mask) {
+  const hn::ScalableTag<std::uint32_t> d;
+  const hn::Rebind<std::uint8_t, decltype(d)> d8;
+  const std::size_t N = hn::Lanes(d);
+  for (std::size_t y = 0; y < frame.height; ++y, mask += frame.width) {
+    const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
+    std::size_t x = 0;
+    for (; x + N <= frame.width; x += N) {
+      const auto pixels = hn::BitCast(d, LoadPixels(row, x));
+      const auto opaque = hn::And(hn::ShiftRight<7>(pixels), hn::Set(d, 1u));
+      hn::StoreU(hn::TruncateTo(d8, opaque), d8, mask + x);
+    }
+    for (; x < frame.width; ++x) mask[x] = row[4 * x] >> 7;
+  }
+}
+
+void ColorRows(const ArgbFrame& frame, float* color) {
+  const Floats df;
+  const std::size_t N = hn::Lanes(df);
+  for (std::size_t y = 0; y < frame.height; ++y, color += 3 * frame.width) {
+    const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
+    std::size_t x = 0;
+    for (; x + N <= frame.width; x += N) {
+      const auto pixels = LoadPixels(row, x);
+      hn::StoreInterleaved3(hn::ConvertTo(df, Red(pixels)), hn::ConvertTo(df, Green(pixels)),
+                            hn::ConvertTo(df, Blue(pixels)), df, color + 3 * x);
+    }
+    for (; x < frame.width; ++x) {
+      for (std::size_t c = 0; c < 3; ++c) color[3 * x + c] = row[4 * x + 1 + c];
+    }
+  }
+}
+
+}  // namespace HWY_NAMESPACE
+}  // namespace marrow::tracking
+HWY_AFTER_NAMESPACE();
+
+#if HWY_ONCE
+namespace marrow::tracking {
+
+HWY_EXPORT(LumaRows);
+HWY_EXPORT(MaskRows);
+HWY_EXPORT(ColorRows);
+
+void LumaFromArgb(const ArgbFrame& frame, float* luma) {
+  HWY_DYNAMIC_DISPATCH(LumaRows)(frame, luma);
+}
+
+void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask) {
+  HWY_DYNAMIC_DISPATCH(MaskRows)(frame, mask);
+}
+
+void ColorFromArgb(const ArgbFrame& frame, float* color) {
+  HWY_DYNAMIC_DISPATCH(ColorRows)(frame, color);
+}
+
+}  // namespace marrow::tracking
+#endif  // HWY_ONCE

@@ -1,0 +1,46 @@
+#pragma once
+
+#include <cstddef>
+#include <vector>
+
+namespace marrow::tracking {
+
+// Levels of an image, each half the size of the one before. Samples are 32-bit floats, interleaved
+// by channel, rows top-down without padding. A point of level 0 lies at its coordinates times 0.5^l
+// on level l, without a half-pixel shift: column j lies over column 2j of the level before.
+class ImagePyramid {
+ public:
+  ImagePyramid() = default;
+  // Sizes every level, all zero. Level 0 is there even if `levels` is 0.
+  ImagePyramid(std::size_t width, std::size_t height, std::size_t channels, std::size_t levels);
+
+  // ceil(width / 2^level), ceil(height / 2^level), and the first sample of a level.
+  std::size_t LevelWidth(std::size_t level) const;
+  std::size_t LevelHeight(std::size_t level) const;
+  float* LevelData(std::size_t level) { return data.data() + level_starts_[level]; }
+  const float* LevelData(std::size_t level) const { return data.data() + level_starts_[level]; }
+
+  // Constant after construction, but for the samples.
+  std::size_t width = 0;
+  std::size_t height = 0;
+  std::size_t channels = 0;
+  std::size_t levels = 0;
+  std::vector<float> data;  // level 0 first, one after the other, no gaps
+
+ private:
+  std::vector<std::size_t> level_starts_;
+};
+
+// Fills levels 1 to levels - 1 from level 0 by ReduceLevel. scratch is grown at the first call and
+// used again.
+void BuildLevels(ImagePyramid& pyramid, std::vector<float>& scratch);
+
+// Reduces `source`, width by height pixels, to `destination`, (width + 1) / 2 by (height + 1) / 2.
+// Each row that is kept (every other one) is smoothed along x by (1 2 1) / 4; there is no filter
+// along y. The destination's outermost pixels are 0. A source with a side under 3 clears the
+// destination's first row and leaves the rest as it was. channels is 1, 3 or 4; with any other
+// count the destination gets its black frame only. The images may not overlap.
+void ReduceLevel(const float* source, std::size_t width, std::size_t height, std::size_t channels,
+                 float* destination, std::vector<float>& scratch);
+
+}  // namespace marrow::tracking

@@ -1,0 +1,38 @@
+#pragma once
+
+#include "tracking/affine_state.h"
+#include "tracking/packed_cholesky.h"
+#include "tracking/window_kernels.h"
+
+namespace marrow::tracking {
+
+// A pyramid level as the solvers see it.
+struct level_image {
+  const float* data;
+  std::size_t width;
+  std::size_t height;
+};
+
+// Inverse of the normal matrix of one template level, sum of J'J with J = (Gx / 2, Gy / 2) and in
+// the joint mode T and 1 for each channel.
+struct translation_normal {
+  double xx, xy, yy;  // closed-form inverse of the modes without color columns
+  packed_cholesky joint;
+};
+
+// False if the joint matrix is not positive definite. A singular matrix of the other modes passes:
+// its steps are not finite, and the next bounds test stops them.
+bool PrepareTranslation(const template_planes& level, const offset_planes& offsets,
+                        const window_shape& shape, color_mode mode, translation_normal& normal);
+
+// Inverse-compositional alignment of a template (Baker and Matthews, Lucas-Kanade 20 Years On,
+// 2004) by translation: iterates state.dx, dy (and gain, bias) until the steps are under the
+// tolerances. state.x, y: the template's position on this level. `window` receives the last sample.
+// Returns the iteration at which it converged, max_iterations, or kLevelFailed when the window
+// leaves the image.
+int SolveTranslation(const template_planes& level, const window_shape& shape,
+                     const translation_normal& normal, const level_image& image, color_mode mode,
+                     const solver_tolerances& tolerances, int max_iterations, AffineState& state,
+                     float* window);
+
+}  // namespace marrow::tracking
