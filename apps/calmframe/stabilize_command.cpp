@@ -1,6 +1,7 @@
 #include "apps/calmframe/stabilize_command.h"
 
 #include <map>
+#include <sstream>
 #include <utility>
 #include <vector>
 
@@ -53,8 +54,16 @@ CLI::Option* AddChoice(CLI::App& command, const std::string& flag, Value& value,
 
 void AddPercent(CLI::App& command, const std::string& flag, double& value, double least,
                 double most, const std::string& description) {
+  // CLI::Range lets "nan" through.
+  const auto check = [least, most](const std::string& text) {
+    double number = 0;
+    const bool valid = CLI::detail::lexical_cast(text, number) && number >= least && number <= most;
+    std::ostringstream message;
+    if (!valid) message << text << " is not in the range " << least << " to " << most;
+    return message.str();
+  };
   command.add_option(flag, value, description)
-      ->check(CLI::Range(least, most))
+      ->check(check)
       ->type_name("PERCENT")
       ->capture_default_str()
       ->group("Controls");

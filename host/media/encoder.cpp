@@ -84,6 +84,13 @@ AVPixelFormat ChoosePixelFormat(const std::string& shown, const AVCodec& codec,
   return best;
 }
 
+// Containers that state one frame rate in place of a time for each frame.
+bool HasOneRate(const AVOutputFormat& format) {
+  if (format.flags & AVFMT_NOTIMESTAMPS) return true;
+  const std::string name = format.name;
+  return name == "avi" || name == "dv" || name == "gxf" || name == "swf" || name == "yuv4mpegpipe";
+}
+
 }  // namespace
 
 Encoder::Encoder(const std::string& shown, const AVOutputFormat& format, const ClipInfo& source,
@@ -112,7 +119,7 @@ Encoder::Encoder(const std::string& shown, const AVOutputFormat& format, const C
                     shown + ": no encoder for a " + std::string(format.name) + " file");
     }
   }
-  even_times_ = !(format.flags & AVFMT_VARIABLE_FPS);
+  even_times_ = HasOneRate(format);
   const AVPixelFormat pixel_format =
       ChoosePixelFormat(shown, *codec, source, width, height, settings.pixel_format);
   int error = 0;

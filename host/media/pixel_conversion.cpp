@@ -299,10 +299,14 @@ void Scaler::ScalePart(const AVFrame& from, AVFrame& to, const ColourModel& mode
     position("src_h_chr_pos", "src_v_chr_pos", from);
     position("dst_h_chr_pos", "dst_v_chr_pos", to);
     const int* coefficients = sws_getCoefficients(SwscaleMatrix(model.matrix));
-    const bool from_full =
-        IsYuv(LayoutOf(from)) || LayoutOf(from).nb_components < 3 ? model.full_range : false;
-    const bool to_full =
-        IsYuv(LayoutOf(to)) || LayoutOf(to).nb_components < 3 ? model.full_range : true;
+    // From YUV to YUV code words are only shifted; told that they are full, swscale repeats the
+    // upper bits of some planes in the lower ones.
+    const auto coded = [](const AVFrame& f) {
+      return IsYuv(LayoutOf(f)) || LayoutOf(f).nb_components < 3;
+    };
+    const bool shifted = coded(from) && coded(to);
+    const bool from_full = coded(from) && model.full_range && !shifted;
+    const bool to_full = coded(to) ? model.full_range && !shifted : true;
     const auto set_colours = [&] {
       sws_setColorspaceDetails(context.get(), coefficients, from_full, coefficients, to_full, 0,
                                1 << 16, 1 << 16);
@@ -383,6 +387,10 @@ FramePtr PixelsToFrame::Convert(const Pixel* pixels, std::ptrdiff_t row_bytes) {
     return alpha ? 1.0f : static_cast<float>(pixel.alpha) * kUnit<Pixel>;
   };
   if (rgb && layout.comp[0].depth >= 8 && layout.comp[0].depth <= 16) {
+    // av_write_image_line2 sets bits and clears none.
+    for (const AVBufferRef* buffer : frame->buf) {
+      if (buffer) std::memset(buffer->data, 0, buffer->size);
+    }
     std::vector<std::uint16_t> line(width_);
     for (int y = 0; y < height_; ++y) {
       const Pixel* in = Row(pixels, row_bytes, y);

@@ -161,6 +161,7 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
                {"stabilize a b --method perspectiv", "did you mean perspective?"},
                {"stabilize a b --smoothness 2000", "2000"},
                {"stabilize a b --smoothness nan", "nan"},
+               {"stabilize a b --additional-scale=-inf", "inf"},
                {"stabilize a b --depth 12", "12"},
                {"stabilize a", "OUT"},
                {"", "calmframe --help"}};

@@ -16,6 +16,16 @@
 
 namespace calmframe::media {
 
+// What a command prints; fails the test if the command fails.
+inline std::string Output(const std::string& command) {
+  std::string text;
+  FILE* pipe = popen(command.c_str(), "r");
+  char buffer[4096];
+  while (std::size_t n = fread(buffer, 1, sizeof buffer, pipe)) text.append(buffer, n);
+  EXPECT_EQ(pclose(pipe), 0) << command;
+  return text;
+}
+
 // A folder of its own for each test, with small clips and their pixels.
 class ClipTest : public testing::Test {
  protected:
@@ -32,21 +42,12 @@ class ClipTest : public testing::Test {
     return static_cast<std::size_t>(std::distance(begin(all), end(all)));
   }
 
-  // What a command prints; fails the test if the command fails.
-  static std::string Run(const std::string& command) {
-    std::string text;
-    FILE* pipe = popen(command.c_str(), "r");
-    char buffer[4096];
-    while (std::size_t n = fread(buffer, 1, sizeof buffer, pipe)) text.append(buffer, n);
-    EXPECT_EQ(pclose(pipe), 0) << command;
-    return text;
-  }
   static void Ffmpeg(const std::string& arguments) {
-    Run("ffmpeg -nostdin -y -v error " + arguments);
+    Output("ffmpeg -nostdin -y -v error " + arguments);
   }
   static std::string PacketHash(const std::string& path, const std::string& streams) {
-    return Run("ffmpeg -nostdin -v error -i '" + path + "' -map " + streams +
-               " -c copy -f data - | md5sum");
+    return Output("ffmpeg -nostdin -v error -i '" + path + "' -map " + streams +
+                  " -c copy -f streamhash -hash md5 -");
   }
 
   static ClipInfo Made(int width, int height, std::size_t frames, int bit_depth = 8) {
