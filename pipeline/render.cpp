@@ -61,7 +61,15 @@ class PictureRenderer {
         renderer_(MakeRenderer(warps_, 1.0f / GeometryOf(reader.info()).pixel_aspect(), 1.0f)),
         rect_(setupOutputRect(settings_.framing, renderer_, reader.info().width,
                               reader.info().height)),
-        whole_(rect_.width, rect_.height) {}
+        whole_(rect_.width, rect_.height) {
+    if (crop_ && (crop_->cropWidth <= 0 || crop_->cropHeight <= 0)) {
+      throw SolveFailure(
+          "no part of the picture stays in view; set --framing stabilize-only or adjust other "
+          "flags");
+    }
+  }
+
+  bool Overcropped() { return crop_ && isOvercropped(warps_, *crop_, settings_, renderer_); }
 
   const Pictures& pictures() const { return sources_.pictures(); }
 
@@ -90,6 +98,10 @@ void RenderAs(media::ClipReader& reader, const Solution& solution,
               Listener& listener) {
   const media::ClipInfo& info = reader.info();
   PictureRenderer<Pixel> renderer(reader, solution, controls);
+  if (renderer.Overcropped()) {
+    listener.Warn(
+        "To avoid extreme cropping set Framing to Stabilize Only or adjust other parameters.");
+  }
   const Pictures& pictures = renderer.pictures();
   WorldX<Pixel> output(info.width, info.height);
   WorldX<Pixel> field(pictures.interlaced() ? info.width : 0, info.height);

@@ -85,6 +85,7 @@ void Stabilize(const std::string& input, const Controls& controls, const Output&
   const Solution solution = Solve(features, GeometryOf(info), controls, listener);
   Render(*reader, solution, controls, output.depth, *writer, listener);
   writer->Finish();
+  for (const std::string& line : writer->warnings()) listener.Warn(line);
 }
 
 }  // namespace calmframe::pipeline

@@ -24,6 +24,16 @@ double GetZoom(const ClipWarps& warps, const cropper* crop, const RenderSettings
                           settings.additional_scale);
 }
 
+bool isOvercropped(const ClipWarps& warps, const cropper& crop, const RenderSettings& settings,
+                   Renderer& renderer) {
+  const auto least_width = static_cast<std::int32_t>(static_cast<float>(warps.frameWidth()) * 0.4f);
+  const auto least_height =
+      static_cast<std::int32_t>(static_cast<float>(warps.frameHeight()) * 0.4f);
+  if (crop.cropWidth >= least_width && crop.cropHeight >= least_height) return false;
+  const double zoom = GetZoom(warps, &crop, settings, renderer);
+  return crop.cropWidth * zoom < least_width || crop.cropHeight * zoom < least_height;
+}
+
 OutputRect setupOutputRect(Framing framing, const Renderer& renderer, std::int32_t width,
                            std::int32_t height) {
   if (crops(framing)) return {width, height, 0, 0};

@@ -63,6 +63,10 @@ Renderer MakeRenderer(const ClipWarps& warps, float scaleX, float scaleY);
 double GetZoom(const ClipWarps& warps, const cropper* crop, const RenderSettings& settings,
                Renderer& renderer);
 
+// Whether the crop window, as shown, is under two fifths of the frame in either direction.
+bool isOvercropped(const ClipWarps& warps, const cropper& crop, const RenderSettings& settings,
+                   Renderer& renderer);
+
 struct OutputRect {
   std::int32_t width;
   std::int32_t height;

@@ -396,6 +396,23 @@ TEST(FrameRendererAlpha, ColourOfTransparentPixelsDoesNotShow) {
   EXPECT_EQ(out.row(8)[8].blue, 50);
 }
 
+TEST(Overcropped, UnderTwoFifthsAsShown) {
+  Clip clip(1920, 1080, 3, 3, [](double x, double y) { return point2{x, y}; });
+  Renderer R = MakeRenderer(clip, 1, 1);
+  const auto overcropped = [&](int width, int height, Framing framing) {
+    cropper crop(1, 1920, 1080);
+    crop.cropWidth = width;
+    crop.cropHeight = height;
+    return isOvercropped(clip, crop, RenderSettings{framing, 0.0f, 1.5f, 1.0f}, R);
+  };
+  EXPECT_FALSE(overcropped(768, 432, Framing::crop));
+  EXPECT_TRUE(overcropped(767, 432, Framing::crop));
+  EXPECT_TRUE(overcropped(1900, 431, Framing::crop));
+  EXPECT_FALSE(overcropped(767, 431, Framing::crop_auto_scale));  // enlarged
+  EXPECT_TRUE(overcropped(511, 431, Framing::crop_auto_scale));
+  EXPECT_TRUE(overcropped(0, -3, Framing::crop_auto_scale));
+}
+
 TEST(SetupOutput, TheWholePlaneWithoutACrop) {
   Clip clip(100, 80, 3, 3, [](double x, double y) { return point2{x * 1.1 - 8, y - 3.5}; });
   const Renderer R = MakeRenderer(clip, 1, 1);
