@@ -214,16 +214,19 @@ HWY_INLINE bool RunOfOneAlpha(const source_plane& source, const Positions& at, i
 }
 #endif
 
+template <class Pixel>
+HWY_INLINE void Locate(const source_plane& source, const source_run<Pixel>& run, Positions& at) {
+  const float g = static_cast<float>(run.g);
+  AxisPositions(run.x, run.dx, g, source.max_x, source.width, run.count, at.ix, at.fx);
+  AxisPositions(run.y, run.dy, g, source.max_y, source.height, run.count, at.iy, at.fy);
+}
+
 template <class Depth>
-void Run(const source_plane& source, const source_run& run, int count,
-         typename Depth::Pixel* out_pixels) {
+HWY_INLINE void Sample(const source_plane& source, const Positions& at, int count,
+                       typename Depth::Pixel* out_pixels) {
   using channel = typename Depth::channel;
   const hn::FixedTag<float, 4> d;
   constexpr std::ptrdiff_t pixel = sizeof(typename Depth::Pixel);
-  Positions at;
-  const float g = static_cast<float>(run.g);
-  AxisPositions(run.x, run.dx, g, source.max_x, source.width, count, at.ix, at.fx);
-  AxisPositions(run.y, run.dy, g, source.max_y, source.height, count, at.iy, at.fy);
   auto* out = reinterpret_cast<unsigned char*>(out_pixels);
 #ifdef CALMFRAME_PAIRS
   if (source.width > 1 && source.height > 1 && RunOfOneAlpha<Depth>(source, at, count, out)) {
@@ -270,14 +273,26 @@ void Run(const source_plane& source, const source_run& run, int count,
   }
 }
 
-void Run8(const source_plane& source, const source_run& run, int count, HX_Pixel8* out) {
-  Run<Depth8>(source, run, count, out);
+// The positions of the run ahead are found before a run is sampled, to hide their latency.
+template <class Depth>
+void Runs(const source_plane& source, const source_run<typename Depth::Pixel>* runs,
+          std::size_t n) {
+  Positions at[2];
+  if (n > 0) Locate(source, runs[0], at[0]);
+  for (std::size_t i = 0; i < n; ++i) {
+    if (i + 1 < n) Locate(source, runs[i + 1], at[(i + 1) % 2]);
+    Sample<Depth>(source, at[i % 2], runs[i].count, runs[i].out);
+  }
 }
-void Run16(const source_plane& source, const source_run& run, int count, HX_Pixel16* out) {
-  Run<Depth16>(source, run, count, out);
+
+void Runs8(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n) {
+  Runs<Depth8>(source, runs, n);
 }
-void RunFloat(const source_plane& source, const source_run& run, int count, HX_PixelFloat* out) {
-  Run<DepthFloat>(source, run, count, out);
+void Runs16(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n) {
+  Runs<Depth16>(source, runs, n);
+}
+void RunsFloat(const source_plane& source, const source_run<HX_PixelFloat>* runs, std::size_t n) {
+  Runs<DepthFloat>(source, runs, n);
 }
 
 #undef CALMFRAME_PAIRS
@@ -287,21 +302,21 @@ HWY_AFTER_NAMESPACE();
 
 #if HWY_ONCE
 namespace sampling {
-HWY_EXPORT(Run8);
-HWY_EXPORT(Run16);
-HWY_EXPORT(RunFloat);
+HWY_EXPORT(Runs8);
+HWY_EXPORT(Runs16);
+HWY_EXPORT(RunsFloat);
 }  // namespace sampling
 
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel8* out) {
+void SampleRuns(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n) {
   using namespace sampling;
-  HWY_DYNAMIC_DISPATCH(Run8)(source, run, count, out);
+  HWY_DYNAMIC_DISPATCH(Runs8)(source, runs, n);
 }
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel16* out) {
+void SampleRuns(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n) {
   using namespace sampling;
-  HWY_DYNAMIC_DISPATCH(Run16)(source, run, count, out);
+  HWY_DYNAMIC_DISPATCH(Runs16)(source, runs, n);
 }
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_PixelFloat* out) {
+void SampleRuns(const source_plane& source, const source_run<HX_PixelFloat>* runs, std::size_t n) {
   using namespace sampling;
-  HWY_DYNAMIC_DISPATCH(RunFloat)(source, run, count, out);
+  HWY_DYNAMIC_DISPATCH(RunsFloat)(source, runs, n);
 }
 #endif
