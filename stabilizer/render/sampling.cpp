@@ -1,5 +1,7 @@
 #include "stabilizer/render/sampling.h"
 
+#include <hwy/cache_control.h>
+
 #include <cmath>
 #include <cstdint>
 #include <cstring>
@@ -219,6 +221,14 @@ HWY_INLINE void Locate(const source_plane& source, const source_run<Pixel>& run,
   const float g = static_cast<float>(run.g);
   AxisPositions(run.x, run.dx, g, source.max_x, source.width, run.count, at.ix, at.fx);
   AxisPositions(run.y, run.dy, g, source.max_y, source.height, run.count, at.iy, at.fy);
+  // Rows of a cell are too short for the processor to foresee. The row above is there already, from
+  // the run before.
+  const Neighbours neighbours{source, at, sizeof(Pixel)};
+  const std::ptrdiff_t below = source.height > 1 ? source.row_bytes : 0;
+  hwy::Prefetch(neighbours[0] + below);
+  hwy::Prefetch(neighbours[run.count - 1] + below);
+  hwy::Prefetch(run.out);
+  hwy::Prefetch(run.out + run.count - 1);
 }
 
 template <class Depth>
