@@ -124,43 +124,77 @@ struct candidate {
   const surface* source;
   box bounds;
   projected view;
+  const texture* skin;
+  double repeats_across;  // a metre
+  double repeats_along;
 };
 
-// What one pixel's centre or one sample shows: a candidate's place in the list, or -1.
-int nearest(const std::vector<candidate>& candidates, double x, double y) {
-  int best = -1;
+// What is seen at a place, or null.
+const candidate* nearest(const std::vector<const candidate*>& candidates, double x, double y) {
+  const candidate* best = nullptr;
   double best_d = 0.0;
-  for (std::size_t k = 0; k < candidates.size(); ++k) {
-    const candidate& c = candidates[k];
-    if (x < c.bounds.left - 2 || x > c.bounds.right + 2) continue;
-    const double d = c.view.d.at(x, y);
+  for (const candidate* c : candidates) {
+    const double d = c->view.d.at(x, y);
     if (!(d > best_d && d < 1.0 / kNear)) continue;
-    if (!inside(*c.source, c.view.a.at(x, y) / d, c.view.b.at(x, y) / d)) continue;
-    best = static_cast<int>(k);
+    const double w = 1.0 / d;
+    if (!inside(*c->source, c->view.a.at(x, y) * w, c->view.b.at(x, y) * w)) continue;
+    best = c;
     best_d = d;
   }
   return best;
 }
 
-// The colour of a surface at a pixel, smoothed over `size` pixels.
-colour shade(const candidate& c, double x, double y, double size, double haze) {
+// The colour of a surface at a pixel.
+colour shade(const candidate& c, double x, double y, double haze) {
   const projected& v = c.view;
   const surface& s = *c.source;
   const double w = 1.0 / v.d.at(x, y);
   const double across = v.a.at(x, y) * w;
   const double along = v.b.at(x, y) * w;
-  const double ku = size * w / s.repeat_across;
-  const double kv = size * w / s.repeat_along;
-  colour out = texture_of(s.what).sample(
-      across / s.repeat_across, along / s.repeat_along, (v.a.per_x - across * v.d.per_x) * ku,
-      (v.b.per_x - along * v.d.per_x) * kv, (v.a.per_y - across * v.d.per_y) * ku,
-      (v.b.per_y - along * v.d.per_y) * kv);
+  const double ku = kBlur * w * c.repeats_across;
+  const double kv = kBlur * w * c.repeats_along;
+  colour out =
+      c.skin->sample(across * c.repeats_across, along * c.repeats_along,
+                     (v.a.per_x - across * v.d.per_x) * ku, (v.b.per_x - along * v.d.per_x) * kv,
+                     (v.a.per_y - across * v.d.per_y) * ku, (v.b.per_y - along * v.d.per_y) * kv);
   const bool fades = s.what != material::sky;
   const auto clear = fades ? static_cast<float>(std::exp(-w / haze)) : 1.0f;
   for (std::size_t k = 0; k < 3; ++k) {
     out[k] = clear * s.tint[k] * out[k] + (1 - clear) * kHaze[k];
   }
   return out;
+}
+
+// The colour of a pixel that several surfaces share: each has its colour in the middle of what is
+// seen of it, and the weight of how much that is.
+colour shade_outline(const std::vector<const candidate*>& candidates, double x, double y,
+                     double haze) {
+  constexpr int side = 4;
+  struct part {
+    const candidate* what;
+    int count;
+    double x, y;  // sums
+  };
+  std::array<part, side * side> parts;
+  std::size_t n = 0;
+  for (int s = 0; s < side * side; ++s) {
+    const double sx = x + (s % side + 0.5) / side - 0.5;
+    const double sy = y + (s / side + 0.5) / side - 0.5;
+    const candidate* what = nearest(candidates, sx, sy);
+    std::size_t k = 0;
+    while (k < n && parts[k].what != what) ++k;
+    if (k == n) parts[n++] = {what, 0, 0, 0};
+    parts[k] = {what, parts[k].count + 1, parts[k].x + sx, parts[k].y + sy};
+  }
+  colour sum = {0, 0, 0};
+  for (std::size_t k = 0; k < n; ++k) {
+    const part& p = parts[k];
+    // What is seen of a convex surface need not hold its middle, but the surface does.
+    const colour c = p.what ? shade(*p.what, p.x / p.count, p.y / p.count, haze) : kHaze;
+    const float weight = static_cast<float>(p.count) / (side * side);
+    for (std::size_t j = 0; j < 3; ++j) sum[j] += weight * c[j];
+  }
+  return sum;
 }
 
 surface upright(double x, double z, double bottom, double width, double height, material what,
@@ -323,7 +357,13 @@ void scene::draw_rows(int frame, int first, int end, HX_Pixel8* pixels,
            std::max(b.bottom, c.bottom) + 4};
     }
     if (b.right < -2 || b.left > width + 1 || b.bottom < first - 3 || b.top > end + 2) continue;
-    strip.push_back({static_cast<int>(k), &world[k], b, {}});
+    strip.push_back({static_cast<int>(k),
+                     &world[k],
+                     b,
+                     {},
+                     &texture_of(world[k].what),
+                     1.0 / world[k].repeat_across,
+                     1.0 / world[k].repeat_along});
   }
 
   random_stream frame_random(substream(options_.seed, 2 * static_cast<std::uint64_t>(frame)));
@@ -369,6 +409,7 @@ void scene::draw_rows(int frame, int first, int end, HX_Pixel8* pixels,
   };
 
   std::vector<int> above(columns), here(columns), below(columns);
+  std::vector<const candidate*> about;  // a pixel
   identify(first - 1, above);
   identify(first, here);
   for (int y = first; y < end; ++y) {
@@ -382,20 +423,17 @@ void scene::draw_rows(int frame, int first, int end, HX_Pixel8* pixels,
       const auto x = static_cast<double>(i);
       const bool plain = above[i] == id && below[i] == id && (i == 0 || here[i - 1] == id) &&
                          (i + 1 == columns || here[i + 1] == id);
-      colour c = {0, 0, 0};
-      if (plain) {
-        c = id < 0 ? kHaze : shade(strip[static_cast<std::size_t>(id)], x, y, kBlur, options_.haze);
-      } else {
-        constexpr int side = 4;
-        for (int s = 0; s < side * side; ++s) {
-          const double sx = x + (s % side + 0.5) / side - 0.5;
-          const double sy = y + (s / side + 0.5) / side - 0.5;
-          const int k = nearest(strip, sx, sy);
-          const colour part = k < 0 ? kHaze
-                                    : shade(strip[static_cast<std::size_t>(k)], sx, sy,
-                                            kBlur / side, options_.haze);
-          for (std::size_t j = 0; j < 3; ++j) c[j] += part[j] / (side * side);
+      colour c = kHaze;
+      if (!plain) {
+        about.clear();
+        for (const candidate& k : strip) {
+          const box& b = k.bounds;
+          if (x < b.left - 2 || x > b.right + 2 || y < b.top - 2 || y > b.bottom + 2) continue;
+          about.push_back(&k);
         }
+        c = shade_outline(about, x, y, options_.haze);
+      } else if (id >= 0) {
+        c = shade(strip[static_cast<std::size_t>(id)], x, y, options_.haze);
       }
       std::array<std::uint8_t, 3> bytes;
       for (std::size_t j = 0; j < 3; ++j) {

@@ -1,6 +1,7 @@
 #include "synthetic/texture.h"
 
 #include <algorithm>
+#include <bit>
 #include <cmath>
 
 #include "platform/tessel/threads.h"
@@ -167,6 +168,57 @@ rgb texel(material what, double u, double v) {
   return sky(u, v);
 }
 
+// A position as a fraction of a repeat, in 1/2^32: it wraps by itself.
+std::uint32_t wrapped(double u) {
+  return static_cast<std::uint32_t>(static_cast<std::int64_t>(u * 0x1p32));
+}
+
+// One axis at a level of 2^log_side texels.
+struct axis {
+  std::uint32_t first;
+  std::uint32_t second;
+  std::uint32_t fraction;  // of the way to the second, in 1/256
+};
+
+axis at_level(std::uint32_t u, int log_side) {
+  // Texel centres lie at halves.
+  const std::uint64_t half = std::uint64_t{1} << (31 - log_side);
+  const std::uint64_t x =
+      std::uint64_t{static_cast<std::uint32_t>(u - static_cast<std::uint32_t>(half))} << 8;
+  const auto fixed = static_cast<std::uint32_t>(x >> (32 - log_side));
+  const std::uint32_t mask = (1u << log_side) - 1;
+  return {fixed >> 8, ((fixed >> 8) + 1) & mask, fixed & 255};
+}
+
+// Lanes of 256 times the colour. The weights add up to 256, so no lane runs into the next.
+std::uint64_t bilinear(const std::vector<std::uint64_t>& texels, int log_side, std::uint32_t u,
+                       std::uint32_t v) {
+  const axis x = at_level(u, log_side);
+  const axis y = at_level(v, log_side);
+  const std::uint64_t* top = texels.data() + (std::size_t{y.first} << log_side);
+  const std::uint64_t* bottom = texels.data() + (std::size_t{y.second} << log_side);
+  const std::uint64_t both = (x.fraction * y.fraction + 128) >> 8;
+  return top[x.first] * (256 - x.fraction - y.fraction + both) +
+         top[x.second] * (x.fraction - both) + bottom[x.first] * (y.fraction - both) +
+         bottom[x.second] * both;
+}
+
+// A sum of such lanes.
+struct lane_sum {
+  std::uint64_t red_blue = 0;  // 32 bits each
+  std::uint64_t green = 0;
+
+  void add(std::uint64_t lanes) {
+    red_blue += lanes & 0x0000FFFF0000FFFF;
+    green += lanes >> 16 & 0xFFFF;
+  }
+  void add_to(colour& c, float weight) const {
+    c[0] += weight * static_cast<float>(static_cast<std::uint32_t>(red_blue));
+    c[1] += weight * static_cast<float>(static_cast<std::uint32_t>(green));
+    c[2] += weight * static_cast<float>(static_cast<std::uint32_t>(red_blue >> 32));
+  }
+};
+
 }  // namespace
 
 texture::texture(material what, int side) : side_(side) {
@@ -177,59 +229,32 @@ texture::texture(material what, int side) : side_(side) {
         for (std::size_t x = 0; x < n; ++x) {
           const rgb c = texel(what, (static_cast<double>(x) + 0.5) / side,
                               (static_cast<double>(y) + 0.5) / side);
+          std::uint64_t lanes = 0;
           for (std::size_t k = 0; k < 3; ++k) {
-            levels_[0][y * n + x][k] =
-                static_cast<std::uint8_t>(std::clamp(c[k] + 0.5, 0.0, 255.0));
+            lanes |= static_cast<std::uint64_t>(std::clamp(c[k] + 0.5, 0.0, 255.0)) << (16 * k);
           }
+          levels_[0][y * n + x] = lanes;
         }
       },
       n);
   for (std::size_t m = n / 2; m > 0; m /= 2) {
-    const auto& finer = levels_.back();
-    std::vector<std::array<std::uint8_t, 4>> coarser(m * m);
+    const texels& finer = levels_.back();
+    texels coarser(m * m);
     for (std::size_t y = 0; y < m; ++y) {
       for (std::size_t x = 0; x < m; ++x) {
-        for (std::size_t k = 0; k < 3; ++k) {
-          const std::size_t i = 4 * y * m + 2 * x;
-          coarser[y * m + x][k] = static_cast<std::uint8_t>(
-              (finer[i][k] + finer[i + 1][k] + finer[i + 2 * m][k] + finer[i + 2 * m + 1][k] + 2) /
-              4);
-        }
+        const std::uint64_t* p = finer.data() + 4 * y * m + 2 * x;
+        const std::uint64_t sum = p[0] + p[1] + p[2 * m] + p[2 * m + 1] + 0x0002000200020002;
+        coarser[y * m + x] = sum >> 2 & 0x00FF00FF00FF00FF;
       }
     }
     levels_.push_back(std::move(coarser));
   }
 }
 
-colour texture::bilinear(int level, double u, double v) const {
-  const auto& texels = levels_[static_cast<std::size_t>(level)];
-  const int n = side_ >> level;
-  const double x = u * n - 0.5;
-  const double y = v * n - 0.5;
-  const double fx = std::floor(x);
-  const double fy = std::floor(y);
-  const auto a = static_cast<float>(x - fx);
-  const auto b = static_cast<float>(y - fy);
-  const int mask = n - 1;
-  const int x0 = static_cast<int>(fx) & mask;
-  const int x1 = (x0 + 1) & mask;
-  const int y0 = (static_cast<int>(fy) & mask) * n;
-  const int y1 = ((static_cast<int>(fy) + 1) & mask) * n;
-  const auto& p = texels[static_cast<std::size_t>(y0 + x0)];
-  const auto& q = texels[static_cast<std::size_t>(y0 + x1)];
-  const auto& r = texels[static_cast<std::size_t>(y1 + x0)];
-  const auto& s = texels[static_cast<std::size_t>(y1 + x1)];
-  colour c;
-  for (std::size_t k = 0; k < 3; ++k) {
-    c[k] = (1 - b) * ((1 - a) * p[k] + a * q[k]) + b * ((1 - a) * r[k] + a * s[k]);
-  }
-  return c;
-}
-
 colour texture::sample(double u, double v, double du_dx, double dv_dx, double du_dy,
                        double dv_dy) const {
-  double longer = std::hypot(du_dx, dv_dx);
-  double shorter = std::hypot(du_dy, dv_dy);
+  double longer = std::sqrt(du_dx * du_dx + dv_dx * dv_dx);
+  double shorter = std::sqrt(du_dy * du_dy + dv_dy * dv_dy);
   double du = du_dx;
   double dv = dv_dx;
   if (longer < shorter) {
@@ -237,24 +262,34 @@ colour texture::sample(double u, double v, double du_dx, double dv_dx, double du
     du = du_dy;
     dv = dv_dy;
   }
-  const int taps = std::clamp(static_cast<int>(std::ceil(longer / std::max(shorter, 1e-12))), 1, 8);
-  const double width = std::max(longer / taps, shorter) * side_;  // texels
+  int taps = 1;
+  while (taps < 8 && taps * shorter < longer) ++taps;
   const int top = static_cast<int>(levels_.size()) - 1;
-  const double lod = std::clamp(std::log2(std::max(width, 1e-12)), 0.0, static_cast<double>(top));
-  const int level = std::min(static_cast<int>(lod), top);
-  const auto between = static_cast<float>(lod - level);
-  colour sum = {0, 0, 0};
-  for (int i = 0; i < taps; ++i) {
-    const double along = (i + 0.5) / taps - 0.5;
-    const colour fine = bilinear(level, u + along * du, v + along * dv);
-    if (between == 0.0f) {
-      for (std::size_t k = 0; k < 3; ++k) sum[k] += fine[k];
-      continue;
-    }
-    const colour coarse = bilinear(level + 1, u + along * du, v + along * dv);
-    for (std::size_t k = 0; k < 3; ++k) sum[k] += (1 - between) * fine[k] + between * coarse[k];
+  const double share = 1.0 / taps;
+  const double width = std::clamp(std::max(longer * share, shorter) * side_, 1.0,
+                                  static_cast<double>(side_));  // texels
+  // The logarithm: its whole part, and what is left by a straight line.
+  const auto bits = std::bit_cast<std::uint64_t>(width);
+  const int level = static_cast<int>(bits >> 52) - 1023;
+  const auto between = static_cast<float>(bits >> 44 & 255) / 256;
+
+  const std::uint32_t step_u = wrapped(share * du);
+  const std::uint32_t step_v = wrapped(share * dv);
+  const double back = 0.5 * share - 0.5;
+  std::uint32_t at_u = wrapped(u + back * du);
+  std::uint32_t at_v = wrapped(v + back * dv);
+  const texels& fine = levels_[static_cast<std::size_t>(level)];
+  const texels& coarse = levels_[static_cast<std::size_t>(std::min(level + 1, top))];
+  lane_sum fine_sum;
+  lane_sum coarse_sum;
+  for (int i = 0; i < taps; ++i, at_u += step_u, at_v += step_v) {
+    fine_sum.add(bilinear(fine, top - level, at_u, at_v));
+    if (between > 0) coarse_sum.add(bilinear(coarse, top - level - 1, at_u, at_v));
   }
-  for (float& c : sum) c /= static_cast<float>(taps);
+  const float scale = static_cast<float>(share / 256);
+  colour sum = {0, 0, 0};
+  fine_sum.add_to(sum, (1 - between) * scale);
+  coarse_sum.add_to(sum, between * scale);
   return sum;
 }
 

@@ -21,14 +21,16 @@ class texture {
   int side() const { return side_; }
 
   // The texture at (u, v), in repeats, smoothed over a parallelogram of one pixel: (du_dx, dv_dx)
-  // and (du_dy, dv_dy) are the pixel's sides. Up to 8 trilinear samples along the longer side.
+  // and (du_dy, dv_dy) are the pixel's sides. Up to 8 trilinear samples along the longer side,
+  // in fixed point: positions to 1/256 texel, weights to 1/256. |u| and |v| below 2^31.
   colour sample(double u, double v, double du_dx, double dv_dx, double du_dy, double dv_dy) const;
 
  private:
-  colour bilinear(int level, double u, double v) const;
+  // Four 16-bit lanes: red, green, blue from the lowest up, each 0 to 255.
+  using texels = std::vector<std::uint64_t>;
 
   int side_;
-  std::vector<std::vector<std::array<std::uint8_t, 4>>> levels_;  // the fourth byte pads
+  std::vector<texels> levels_;  // each of half the side of the one before, down to 1
 };
 
 // The texture of a material, made at the first call; safe from several threads.

@@ -6,6 +6,7 @@
 #include <memory>
 #include <vector>
 
+#include "apps/calmframe/caption.h"
 #include "apps/calmframe/progress_line.h"
 #include "host/media/clip.h"
 #include "platform/tessel/threads.h"
@@ -16,6 +17,7 @@ namespace {
 
 constexpr int kWidth = 1280;
 constexpr int kHeight = 720;
+constexpr int kSeam = 8;  // pixels of black where the pictures of a side-by-side meet
 
 media::EncodeSettings Encoding(const media::EncodeSettings& wanted) {
   media::EncodeSettings settings = wanted;
@@ -62,14 +64,21 @@ void WriteSideBySide(const std::string& left_path, const std::string& right_path
   const int width = info.width;
   const auto writer = media::ClipWriter::Create(path, info, 2 * width, info.height, encode);
   const std::ptrdiff_t row_bytes = 2 * width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8));
-  std::vector<HX_Pixel8> pixels(2 * static_cast<std::size_t>(width) *
-                                static_cast<std::size_t>(info.height));
+  const std::size_t row_pixels = 2 * static_cast<std::size_t>(width);
+  std::vector<HX_Pixel8> pixels(row_pixels * static_cast<std::size_t>(info.height));
+  HX_Pixel8* left_half = pixels.data();
+  HX_Pixel8* right_half = left_half + width;
   const auto frames = static_cast<double>(info.frame_count);
   for (std::size_t f = 0; f < info.frame_count; ++f) {
     if (listener.Cancelled()) throw pipeline::Interrupted();
     listener.Progress("pairing", static_cast<double>(f), frames, "frames");
-    left->Read(f, pixels.data(), row_bytes);
-    right->Read(f, pixels.data() + width, row_bytes);
+    left->Read(f, left_half, row_bytes);
+    right->Read(f, right_half, row_bytes);
+    DrawCaption("SHAKY", left_half, row_pixels, width, info.height);
+    DrawCaption("STEADY", right_half, row_pixels, width, info.height);
+    for (std::size_t y = 0; y < static_cast<std::size_t>(info.height); ++y) {
+      std::fill_n(right_half + y * row_pixels - kSeam / 2, kSeam, HX_Pixel8{255, 0, 0, 0});
+    }
     writer->Write(f, pixels.data(), row_bytes);
   }
   writer->Finish();

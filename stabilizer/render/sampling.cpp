@@ -1,5 +1,7 @@
 #include "stabilizer/render/sampling.h"
 
+#include <hwy/cache_control.h>
+
 #include <cmath>
 #include <cstdint>
 #include <cstring>
@@ -53,49 +55,60 @@ namespace sampling {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
-// How a pixel becomes four f32 lanes and back. Loads are of bytes: rows may lie anywhere.
-struct Depth8 {
-  using Pixel = HX_Pixel8;
-  using channel = std::uint8_t;
+template <class D>
+using Bytes = hn::Repartition<std::uint8_t, D>;
+
+// How channels become f32 lanes, and lanes that hold whole numbers channels. D is the tag of the
+// lanes: one pixel or two. Loads and stores are of bytes: rows may lie anywhere.
+template <class Channel>
+struct IntegerDepth {
+  using channel = Channel;
   static constexpr bool rounds = true;
-  static HWY_INLINE hn::Vec<hn::FixedTag<float, 4>> Load(const unsigned char* p) {
-    const hn::FixedTag<std::int32_t, 4> di;
-    const hn::FixedTag<float, 4> df;
-    return hn::ConvertTo(df, hn::PromoteTo(di, hn::LoadU(hn::FixedTag<std::uint8_t, 4>(), p)));
+  template <class D>
+  static HWY_INLINE hn::Vec<Bytes<hn::Rebind<Channel, D>>> Raw(D, const unsigned char* p) {
+    return hn::LoadU(Bytes<hn::Rebind<Channel, D>>(), p);
   }
-  static HWY_INLINE void Store(hn::Vec<hn::FixedTag<std::int32_t, 4>> v, unsigned char* p) {
-    const hn::FixedTag<std::uint8_t, 4> d;
-    hn::StoreU(hn::DemoteTo(d, v), d, p);
+  template <class D, class V>
+  static HWY_INLINE hn::Vec<D> Lanes(D d, V raw) {
+    const auto channels = hn::BitCast(hn::Rebind<Channel, D>(), raw);
+    return hn::ConvertTo(d, hn::PromoteTo(hn::RebindToSigned<D>(), channels));
+  }
+  template <class D>
+  static HWY_INLINE void Store(D d, hn::Vec<D> v, unsigned char* p) {
+    // 2^23 + v has v in its lowest bits.
+    const hn::RebindToSigned<D> di;
+    const auto magic = hn::Set(d, 8388608.0f);
+    const auto whole = hn::Xor(hn::BitCast(di, hn::Add(v, magic)), hn::BitCast(di, magic));
+    const hn::Rebind<Channel, D> dc;
+    const Bytes<hn::Rebind<Channel, D>> db;
+    hn::StoreU(hn::BitCast(db, hn::DemoteTo(dc, whole)), db, p);
   }
 };
 
-struct Depth16 {
+struct Depth8 : IntegerDepth<std::uint8_t> {
+  using Pixel = HX_Pixel8;
+};
+
+struct Depth16 : IntegerDepth<std::uint16_t> {
   using Pixel = HX_Pixel16;
-  using channel = std::uint16_t;
-  static constexpr bool rounds = true;
-  static HWY_INLINE hn::Vec<hn::FixedTag<float, 4>> Load(const unsigned char* p) {
-    const hn::FixedTag<std::int32_t, 4> di;
-    const hn::FixedTag<float, 4> df;
-    const auto bytes = hn::LoadU(hn::FixedTag<std::uint8_t, 8>(), p);
-    return hn::ConvertTo(df,
-                         hn::PromoteTo(di, hn::BitCast(hn::FixedTag<std::uint16_t, 4>(), bytes)));
-  }
-  static HWY_INLINE void Store(hn::Vec<hn::FixedTag<std::int32_t, 4>> v, unsigned char* p) {
-    const hn::FixedTag<std::uint8_t, 8> d;
-    hn::StoreU(hn::BitCast(d, hn::DemoteTo(hn::FixedTag<std::uint16_t, 4>(), v)), d, p);
-  }
 };
 
 struct DepthFloat {
   using Pixel = HX_PixelFloat;
   using channel = float;
   static constexpr bool rounds = false;
-  static HWY_INLINE hn::Vec<hn::FixedTag<float, 4>> Load(const unsigned char* p) {
-    return hn::BitCast(hn::FixedTag<float, 4>(), hn::LoadU(hn::FixedTag<std::uint8_t, 16>(), p));
+  template <class D>
+  static HWY_INLINE hn::Vec<Bytes<D>> Raw(D, const unsigned char* p) {
+    return hn::LoadU(Bytes<D>(), p);
   }
-  static HWY_INLINE void Store(hn::Vec<hn::FixedTag<float, 4>> v, unsigned char* p) {
-    const hn::FixedTag<std::uint8_t, 16> d;
-    hn::StoreU(hn::BitCast(d, v), d, p);
+  template <class D, class V>
+  static HWY_INLINE hn::Vec<D> Lanes(D d, V raw) {
+    return hn::BitCast(d, raw);
+  }
+  template <class D>
+  static HWY_INLINE void Store(D, hn::Vec<D> v, unsigned char* p) {
+    const Bytes<D> db;
+    hn::StoreU(hn::BitCast(db, v), db, p);
   }
 };
 
@@ -135,64 +148,124 @@ HWY_INLINE void AxisPositions(double start, double step, float g, double highest
   }
 }
 
-template <class Depth>
-HWY_INLINE auto Finish(hn::Vec<hn::FixedTag<float, 4>> v) {
-  if constexpr (Depth::rounds) {
-    const hn::FixedTag<float, 4> df;
-    return hn::ConvertTo(hn::FixedTag<std::int32_t, 4>(), hn::Add(v, hn::Set(df, 0.5f)));
-  } else {
-    return v;
-  }
-}
-
-template <class Depth>
-HWY_INLINE hn::Vec<hn::FixedTag<float, 4>> Between(hn::Vec<hn::FixedTag<float, 4>> p,
-                                                   hn::Vec<hn::FixedTag<float, 4>> q,
-                                                   hn::Vec<hn::FixedTag<float, 4>> s,
-                                                   hn::Vec<hn::FixedTag<float, 4>> t) {
+template <class Depth, class D>
+HWY_INLINE hn::Vec<D> Between(D d, hn::Vec<D> p, hn::Vec<D> q, hn::Vec<D> t) {
+  const auto s = hn::Sub(hn::Set(d, 1.0f), t);
   const auto v = hn::Add(hn::Mul(p, s), hn::Mul(q, t));
   if constexpr (Depth::rounds) {
-    return hn::ConvertTo(hn::FixedTag<float, 4>(), Finish<Depth>(v));
+    return hn::Floor(hn::Add(v, hn::Set(d, 0.5f)));  // v >= 0
   } else {
     return v;
   }
 }
 
+// The source about a run's pixels.
+struct Neighbours {
+  const source_plane& source;
+  const Positions& at;
+  std::ptrdiff_t pixel;  // bytes
+
+  const unsigned char* operator[](int k) const {
+    return source.data + source.row_bytes * at.iy[k] + pixel * at.ix[k];
+  }
+};
+
+#if HWY_MAX_BYTES >= 32 && !HWY_HAVE_SCALABLE
+#define CALMFRAME_PAIRS 1
+// Two pixels at a time, each from two loads of two neighbours, as if all alphas were equal. False
+// where they are not, or are 0 or not a number; the samples then are of no use.
 template <class Depth>
-void Run(const source_plane& source, const source_run& run, int count,
-         typename Depth::Pixel* out_pixels) {
+HWY_INLINE bool RunOfOneAlpha(const source_plane& source, const Positions& at, int count,
+                              unsigned char* out) {
+  using channel = typename Depth::channel;
+  constexpr std::ptrdiff_t pixel = sizeof(typename Depth::Pixel);
+  const hn::FixedTag<float, 8> d;
+  const Bytes<hn::Rebind<channel, decltype(d)>> db;
+  const Neighbours neighbours{source, at, pixel};
+  HWY_ALIGN unsigned char bytes[2 * pixel];
+  std::memcpy(bytes, neighbours[0], pixel);
+  std::memcpy(bytes + pixel, neighbours[0], pixel);
+  const auto first = hn::Load(db, bytes);
+  auto differ = hn::Zero(db);
+  const auto columns = [&](int k) HWY_ATTR {
+    const unsigned char* p = neighbours[k];
+    const auto top = Depth::Raw(d, p);
+    const auto bottom = Depth::Raw(d, p + source.row_bytes);
+    differ = hn::Or(differ, hn::Or(hn::Xor(top, first), hn::Xor(bottom, first)));
+    return Between<Depth>(d, Depth::Lanes(d, top), Depth::Lanes(d, bottom), hn::Set(d, at.fy[k]));
+  };
+  // One more than an odd count: its position is computed too.
+  for (int k = 0; k < count; k += 2, out += 2 * pixel) {
+    const auto even = columns(k);
+    const auto odd = columns(k + 1);
+    const auto tx = hn::OddEvenBlocks(hn::Set(d, at.fx[k + 1]), hn::Set(d, at.fx[k]));
+    const auto sample = Between<Depth>(d, hn::ConcatLowerLower(d, odd, even),
+                                       hn::ConcatUpperUpper(d, odd, even), tx);
+    if (k + 1 < count) {
+      Depth::Store(d, sample, out);
+    } else {
+      Depth::Store(hn::Half<decltype(d)>(), hn::LowerHalf(sample), out);
+    }
+  }
+  hn::Store(differ, db, bytes);
+  channel left, right, alpha;
+  std::memcpy(&left, bytes, sizeof(left));
+  std::memcpy(&right, bytes + pixel, sizeof(right));
+  std::memcpy(&alpha, neighbours[0], sizeof(alpha));
+  return left == 0 && right == 0 && alpha != 0 && alpha == alpha;
+}
+#endif
+
+template <class Pixel>
+HWY_INLINE void Locate(const source_plane& source, const source_run<Pixel>& run, Positions& at) {
+  const float g = static_cast<float>(run.g);
+  AxisPositions(run.x, run.dx, g, source.max_x, source.width, run.count, at.ix, at.fx);
+  AxisPositions(run.y, run.dy, g, source.max_y, source.height, run.count, at.iy, at.fy);
+  // Rows of a cell are too short for the processor to foresee. The row above is there already, from
+  // the run before.
+  const Neighbours neighbours{source, at, sizeof(Pixel)};
+  const std::ptrdiff_t below = source.height > 1 ? source.row_bytes : 0;
+  hwy::Prefetch(neighbours[0] + below);
+  hwy::Prefetch(neighbours[run.count - 1] + below);
+  hwy::Prefetch(run.out);
+  hwy::Prefetch(run.out + run.count - 1);
+}
+
+template <class Depth>
+HWY_INLINE void Sample(const source_plane& source, const Positions& at, int count,
+                       typename Depth::Pixel* out_pixels) {
+  using channel = typename Depth::channel;
   const hn::FixedTag<float, 4> d;
   constexpr std::ptrdiff_t pixel = sizeof(typename Depth::Pixel);
-  Positions at;
-  const float g = static_cast<float>(run.g);
-  AxisPositions(run.x, run.dx, g, source.max_x, source.width, count, at.ix, at.fx);
-  AxisPositions(run.y, run.dy, g, source.max_y, source.height, count, at.iy, at.fy);
+  auto* out = reinterpret_cast<unsigned char*>(out_pixels);
+#ifdef CALMFRAME_PAIRS
+  if (source.width > 1 && source.height > 1 && RunOfOneAlpha<Depth>(source, at, count, out)) {
+    return;
+  }
+#endif
   const std::ptrdiff_t right = source.width > 1 ? pixel : 0;
   const std::ptrdiff_t below = source.height > 1 ? source.row_bytes : 0;
-  auto* out = reinterpret_cast<unsigned char*>(out_pixels);
+  const Neighbours neighbours{source, at, pixel};
   for (int k = 0; k < count; ++k, out += pixel) {
-    const unsigned char* p = source.data + source.row_bytes * at.iy[k] + pixel * at.ix[k];
-    typename Depth::channel a00, a10, a01, a11;
+    const unsigned char* p = neighbours[k];
+    channel a00, a10, a01, a11;
     std::memcpy(&a00, p, sizeof(a00));
     std::memcpy(&a10, p + right, sizeof(a10));
     std::memcpy(&a01, p + below, sizeof(a01));
     std::memcpy(&a11, p + below + right, sizeof(a11));
-    const auto p00 = Depth::Load(p);
-    const auto p10 = Depth::Load(p + right);
-    const auto p01 = Depth::Load(p + below);
-    const auto p11 = Depth::Load(p + below + right);
+    const auto p00 = Depth::Lanes(d, Depth::Raw(d, p));
+    const auto p10 = Depth::Lanes(d, Depth::Raw(d, p + right));
+    const auto p01 = Depth::Lanes(d, Depth::Raw(d, p + below));
+    const auto p11 = Depth::Lanes(d, Depth::Raw(d, p + below + right));
     if (a00 == a10 && a00 == a01 && a00 == a11) {
       if (a00 == 0) {
         std::memset(out, 0, pixel);
         continue;
       }
       const auto ty = hn::Set(d, at.fy[k]);
-      const auto sy = hn::Set(d, 1.0f - at.fy[k]);
-      const auto tx = hn::Set(d, at.fx[k]);
-      const auto sx = hn::Set(d, 1.0f - at.fx[k]);
-      const auto left_column = Between<Depth>(p00, p01, sy, ty);
-      const auto right_column = Between<Depth>(p10, p11, sy, ty);
-      Depth::Store(Finish<Depth>(hn::Add(hn::Mul(left_column, sx), hn::Mul(right_column, tx))),
+      Depth::Store(d,
+                   Between<Depth>(d, Between<Depth>(d, p00, p01, ty),
+                                  Between<Depth>(d, p10, p11, ty), hn::Set(d, at.fx[k])),
                    out);
       continue;
     }
@@ -204,43 +277,56 @@ void Run(const source_plane& source, const source_run& run, int count,
     const channels mixed =
         weighted<Depth::rounds>(weighted<Depth::rounds>(c00, c01, at.fy[k]),
                                 weighted<Depth::rounds>(c10, c11, at.fy[k]), at.fx[k]);
-    typename Depth::channel rounded[4];
-    for (int i = 0; i < 4; ++i) rounded[i] = static_cast<typename Depth::channel>(mixed.v[i]);
+    channel rounded[4];
+    for (int i = 0; i < 4; ++i) rounded[i] = static_cast<channel>(mixed.v[i]);
     std::memcpy(out, rounded, pixel);
   }
 }
 
-void Run8(const source_plane& source, const source_run& run, int count, HX_Pixel8* out) {
-  Run<Depth8>(source, run, count, out);
-}
-void Run16(const source_plane& source, const source_run& run, int count, HX_Pixel16* out) {
-  Run<Depth16>(source, run, count, out);
-}
-void RunFloat(const source_plane& source, const source_run& run, int count, HX_PixelFloat* out) {
-  Run<DepthFloat>(source, run, count, out);
+// The positions of the run ahead are found before a run is sampled, to hide their latency.
+template <class Depth>
+void Runs(const source_plane& source, const source_run<typename Depth::Pixel>* runs,
+          std::size_t n) {
+  Positions at[2];
+  if (n > 0) Locate(source, runs[0], at[0]);
+  for (std::size_t i = 0; i < n; ++i) {
+    if (i + 1 < n) Locate(source, runs[i + 1], at[(i + 1) % 2]);
+    Sample<Depth>(source, at[i % 2], runs[i].count, runs[i].out);
+  }
 }
 
+void Runs8(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n) {
+  Runs<Depth8>(source, runs, n);
+}
+void Runs16(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n) {
+  Runs<Depth16>(source, runs, n);
+}
+void RunsFloat(const source_plane& source, const source_run<HX_PixelFloat>* runs, std::size_t n) {
+  Runs<DepthFloat>(source, runs, n);
+}
+
+#undef CALMFRAME_PAIRS
 }  // namespace HWY_NAMESPACE
 }  // namespace sampling
 HWY_AFTER_NAMESPACE();
 
 #if HWY_ONCE
 namespace sampling {
-HWY_EXPORT(Run8);
-HWY_EXPORT(Run16);
-HWY_EXPORT(RunFloat);
+HWY_EXPORT(Runs8);
+HWY_EXPORT(Runs16);
+HWY_EXPORT(RunsFloat);
 }  // namespace sampling
 
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel8* out) {
+void SampleRuns(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n) {
   using namespace sampling;
-  HWY_DYNAMIC_DISPATCH(Run8)(source, run, count, out);
+  HWY_DYNAMIC_DISPATCH(Runs8)(source, runs, n);
 }
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel16* out) {
+void SampleRuns(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n) {
   using namespace sampling;
-  HWY_DYNAMIC_DISPATCH(Run16)(source, run, count, out);
+  HWY_DYNAMIC_DISPATCH(Runs16)(source, runs, n);
 }
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_PixelFloat* out) {
+void SampleRuns(const source_plane& source, const source_run<HX_PixelFloat>* runs, std::size_t n) {
   using namespace sampling;
-  HWY_DYNAMIC_DISPATCH(RunFloat)(source, run, count, out);
+  HWY_DYNAMIC_DISPATCH(RunsFloat)(source, runs, n);
 }
 #endif

@@ -4,16 +4,19 @@
 
 #include "platform/hx/hx_pixel.h"
 
-// Bilinear samples of a source along a straight run of output pixels.
+// Bilinear samples of a source along straight runs of output pixels.
 
 // Source position of pixel k of a run, k = 0 .. count - 1: x + k * dx / (1 + g * k), and the same
 // for y. It is the exact form of a projective map along a row.
+template <class Pixel>
 struct source_run {
   double x;
   double y;
   double dx;
   double dy;
   double g;
+  int count;   // 1 .. max_run
+  Pixel* out;  // any alignment
 };
 
 struct source_plane {
@@ -29,8 +32,8 @@ struct source_plane {
 // stays below 2e-5 pixels wherever in the source the run lies.
 inline constexpr int max_run = 64;
 
-// Writes `count` <= max_run samples. Colours are weighted by alpha; where no neighbour has any the
-// sample is all zero. Positions that are not finite sample the top left.
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel8* out);
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_Pixel16* out);
-void SampleRun(const source_plane& source, const source_run& run, int count, HX_PixelFloat* out);
+// Writes the samples of each run in turn. Colours are weighted by alpha; where no neighbour has any
+// the sample is all zero. Positions that are not finite sample the top left.
+void SampleRuns(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n);
+void SampleRuns(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n);
+void SampleRuns(const source_plane& source, const source_run<HX_PixelFloat>* runs, std::size_t n);

@@ -1,6 +1,7 @@
 #include "stabilizer/render/strip_renderer.h"
 
 #include <algorithm>
+#include <array>
 #include <cmath>
 #include <limits>
 
@@ -27,31 +28,28 @@ struct edge {
   point2 from;
   double dx;
   double dy;
+  double slope;  // dx / dy, where that is of use
 
   double cross(double x, double y) const { return dx * (y - from.y) - dy * (x - from.x); }
 
-  // Cuts [x0, x1) down to the x of row y that are inside. Each rounding in cross() is monotone in
-  // x, so what passes is one stretch, and only its end has to be looked for, from where the edge
-  // meets the row in exact arithmetic.
-  void cut(double zoom, double y, std::int64_t& x0, std::int64_t& x1) const {
-    const auto inside = [&](std::int64_t x) {
-      return cross(static_cast<double>(x) / zoom, y) >= 0;
-    };
+  // Cuts [x0, x1) down to the x of row y that are inside; test_x[x] is the plane's x. Each rounding
+  // in cross() is monotone in x, so what passes is one stretch, and only its end has to be looked
+  // for, from about where the edge meets the row.
+  void cut(double zoom, const double* test_x, double y, std::int64_t& x0, std::int64_t& x1) const {
+    const auto inside = [&](std::int64_t x) { return cross(test_x[x], y) >= 0; };
     if (x0 >= x1) return;
     if (dy == 0) {
       if (!inside(x0)) x1 = x0;
       return;
     }
-    const double meet = (from.x + dx * (y - from.y) / dy) * zoom;
+    const double meet = (from.x + slope * (y - from.y)) * zoom;
     std::int64_t x = static_cast<std::int64_t>(
-        std::clamp(std::floor(meet), static_cast<double>(x0 - 1), static_cast<double>(x1)));
+        std::clamp(std::floor(meet), static_cast<double>(x0), static_cast<double>(x1)));
     if (dy > 0) {  // a stretch that begins at x0; find the first x past it
-      x = std::max(x, x0);
       while (x < x1 && inside(x)) ++x;
       while (x > x0 && !inside(x - 1)) --x;
       x1 = x;
     } else {  // a stretch that ends at x1; find its first x
-      x = std::max(x, x0);
       while (x < x1 && !inside(x)) ++x;
       while (x > x0 && inside(x - 1)) --x;
       x0 = x;
@@ -68,7 +66,8 @@ struct edge {
 };
 
 edge between(point2 a, point2 b) {
-  return {a, b.x - a.x, b.y - a.y};
+  const double slope = (b.x - a.x) / (b.y - a.y);
+  return {a, b.x - a.x, b.y - a.y, std::fabs(slope) < max_coordinate ? slope : 0.0};
 }
 
 }  // namespace
@@ -78,6 +77,8 @@ struct StripRenderer<Pixel>::cell {
   std::int32_t c;
   std::int32_t r;
   matrix3 square_from_plane;
+  std::array<source_run<Pixel>, 32> runs;  // not drawn yet; about as many as a cell has rows
+  std::size_t run_count;
 };
 
 template <class Pixel>
@@ -110,6 +111,9 @@ StripRenderer<Pixel>::StripRenderer(const Renderer& renderer, const std::vector<
   limit_x_ = std::trunc(renderer.planeWidth * zoom);
   limit_y_ = std::trunc(renderer.planeHeight * zoom);
   tolerance2_ = std::max(4.0, 4.0 / (zoom * zoom));
+  for (int x = 0; x < destination.width(); ++x) {
+    test_x_.push_back(static_cast<double>(x - to_destination_x_) / zoom);
+  }
   for (std::int32_t r = 0; r < renderer.rows; ++r) {
     row_extent extent{std::numeric_limits<double>::infinity(),
                       -std::numeric_limits<double>::infinity()};
@@ -191,15 +195,19 @@ void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t
                                    window_y1 - to_destination_y_);
   if (x0 >= x1 || y0 >= y1) return;
 
-  const cell q{
-      c, r,
-      marrow::stabilization::inverse(marrow::stabilization::square_to_quad(p00, p10, p01, p11))};
+  cell q;
+  q.c = c;
+  q.r = r;
+  q.square_from_plane =
+      marrow::stabilization::inverse(marrow::stabilization::square_to_quad(p00, p10, p01, p11));
+  q.run_count = 0;
   for (const double entry : q.square_from_plane) {
     if (!std::isfinite(entry)) return;  // the quadrilateral has no inside
   }
   const edge edges[4] = {between(p00, p10), between(p10, p11), between(p11, p01),
                          between(p01, p00)};
   const bool owned[4] = {top, right, bottom, left};
+  const double* test_x = test_x_.data() + to_destination_x_;
 
   for (std::int64_t y = y0; y < y1; ++y) {
     const double py = (static_cast<double>(y) + offset_y_) / zoom_;
@@ -209,7 +217,7 @@ void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t
 
     std::int64_t inside0 = x0;
     std::int64_t inside1 = x1;
-    for (const edge& e : edges) e.cut(zoom_, test_y, inside0, inside1);
+    for (const edge& e : edges) e.cut(zoom_, test_x, test_y, inside0, inside1);
     if (!border) {
       drawSpan(q, inside0, inside1, py, row);
       continue;
@@ -218,7 +226,7 @@ void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t
     if (inside0 >= inside1) inside0 = inside1 = x1;
     const auto near = [&](std::int64_t x) {
       for (int i = 0; i < 4; ++i) {
-        if (owned[i] && edges[i].distance2(static_cast<double>(x) / zoom_, test_y) < tolerance2_) {
+        if (owned[i] && edges[i].distance2(test_x[x], test_y) < tolerance2_) {
           return true;
         }
       }
@@ -233,11 +241,12 @@ void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t
     }
     drawSpan(q, begin, x1, py, row);
   }
+  SampleRuns(source_, q.runs.data(), q.run_count);
 }
 
 // Plane positions of the row's pixels are ((x + offset) / zoom, py).
 template <class Pixel>
-void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py,
+void StripRenderer<Pixel>::drawSpan(cell& q, std::int64_t x0, std::int64_t x1, double py,
                                     Pixel* row) const {
   const auto plane_x = [&](std::int64_t x) { return (static_cast<double>(x) + offset_x_) / zoom_; };
   while (x0 < x1 && !(plane_x(x1 - 1) < renderer_.planeWidth)) --x1;
@@ -249,12 +258,16 @@ void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t
     const double v = (h[3] * px + h[4] * py + h[5]) * inverse_w;
     // u(x + k) - u(x) = k (h0 - u h6) / zoom / (w + k h6 / zoom), and v likewise.
     const double step = inverse_w / zoom_;
-    const source_run run{(q.c + u) * renderer_.cellWidth - 0.5,
-                         (q.r + v) * renderer_.cellHeight - 0.5,
-                         (h[0] - u * h[6]) * step * renderer_.cellWidth,
-                         (h[3] - v * h[6]) * step * renderer_.cellHeight, h[6] * step};
-    SampleRun(source_, run, static_cast<int>(std::min<std::int64_t>(max_run, x1 - x)),
-              row + (x + to_destination_x_));
+    q.runs[q.run_count++] = {(q.c + u) * renderer_.cellWidth - 0.5,
+                             (q.r + v) * renderer_.cellHeight - 0.5,
+                             (h[0] - u * h[6]) * step * renderer_.cellWidth,
+                             (h[3] - v * h[6]) * step * renderer_.cellHeight,
+                             h[6] * step,
+                             static_cast<int>(std::min<std::int64_t>(max_run, x1 - x)),
+                             row + (x + to_destination_x_)};
+    if (q.run_count < q.runs.size()) continue;
+    SampleRuns(source_, q.runs.data(), q.run_count);
+    q.run_count = 0;
   }
 }
 

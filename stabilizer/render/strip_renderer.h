@@ -37,7 +37,7 @@ class StripRenderer {
 
   void drawGridRow(std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
   void drawCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
-  void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row) const;
+  void drawSpan(cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row) const;
   marrow::stabilization::point2 vertex(std::int32_t c, std::int32_t r) const {
     const std::size_t i =
         2 * (static_cast<std::size_t>(r) * static_cast<std::size_t>(renderer_.cols) +
@@ -58,6 +58,7 @@ class StripRenderer {
   double limit_x_;  // of the zoomed plane
   double limit_y_;
   double tolerance2_;
+  std::vector<double> test_x_;       // of each destination column, in the plane
   std::vector<row_extent> extents_;  // of each grid row's finite vertices
 };
 
