@@ -97,9 +97,9 @@ struct Clip {
 // Distances from the seeds' true places.
 void Report(benchmark::State& state, std::size_t seeds, std::vector<double> off) {
   std::sort(off.begin(), off.end());
-  state.counters["each"] = benchmark::Counter(
-      static_cast<double>(seeds),
-      benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
+  state.counters["each"] =
+      benchmark::Counter(static_cast<double>(seeds), benchmark::Counter::kIsIterationInvariantRate |
+                                                         benchmark::Counter::kInvert);
   state.counters["features"] = static_cast<double>(seeds);
   state.counters["tracked"] = static_cast<double>(off.size());
   state.counters["off"] = off.empty() ? -1.0 : off[off.size() / 2];
@@ -111,8 +111,8 @@ void ReportRow(benchmark::State& state, const Clip& clip,
   std::vector<double> off;
   for (std::size_t s = 0; s < clip.seeds.size(); ++s) {
     if (row[s].status != 0) continue;
-    off.push_back(std::hypot(row[s].x - clip.seeds[s].x - kShiftX,
-                             row[s].y - clip.seeds[s].y - kShiftY));
+    off.push_back(
+        std::hypot(row[s].x - clip.seeds[s].x - kShiftX, row[s].y - clip.seeds[s].y - kShiftY));
   }
   Report(state, clip.seeds.size(), off);
 }

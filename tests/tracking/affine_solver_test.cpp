@@ -137,8 +137,8 @@ TEST(AffineSolverTest, ACornerOnOrBehindTheImagesEdgeFails) {
   EXPECT_FALSE(fails(wide));
   wide.d = 0.8f;
   EXPECT_TRUE(fails(wide));
-  for (float AffineState::* field : {&AffineState::dx, &AffineState::dy, &AffineState::a,
-                                     &AffineState::b, &AffineState::c, &AffineState::d}) {
+  for (float AffineState::*field : {&AffineState::dx, &AffineState::dy, &AffineState::a,
+                                    &AffineState::b, &AffineState::c, &AffineState::d}) {
     for (const float bad : {kNaN, INFINITY, 1e30f, -1e30f}) {
       AffineState broken(40, 40);
       broken.*field = bad;
@@ -161,7 +161,9 @@ TEST(AffineSolverTest, WindowsThatDoNotTellTheMotionAreSingular) {
     EXPECT_FALSE(singular(Pattern, color));
   }
   // One flat channel has no gain apart from its bias, but motion enough.
-  const auto half_flat = [](double x, double y, double c) { return c == 1 ? 80 : Pattern(x, y, c); };
+  const auto half_flat = [](double x, double y, double c) {
+    return c == 1 ? 80 : Pattern(x, y, c);
+  };
   EXPECT_TRUE(singular(half_flat, true));
   EXPECT_FALSE(singular(half_flat, false));
   // Values that are no numbers are no matrix.

@@ -144,9 +144,9 @@ TEST(FeatureTrackerTest, LostByTheTranslationStage) {
 
 TEST(FeatureTrackerTest, ColourModesOfTheTranslationStage) {
   const ImagePyramid still = Frame(Texture);
-  const ImagePyramid dim = Frame(
-      [](double x, double y, double c) { return (0.8 - 0.1 * c) * Texture(x, y, c) + 12; }, 0.6,
-      -0.4);
+  const ImagePyramid dim =
+      Frame([](double x, double y, double c) { return (0.8 - 0.1 * c) * Texture(x, y, c) + 12; },
+            0.6, -0.4);
   const auto track = [&](int mode) {
     TrackerParams params = With([](auto&) {});
     params.color_correction_translation = mode;

@@ -119,9 +119,8 @@ TEST(TrackingRunTest, TracksFollowADriftUnderChangingLight) {
 
 // Frame 4 is black: everything is lost, nothing is found. From frame 5 on all is there again.
 TEST(TrackingRunTest, LostSlotsAreFilledInTheSameFrameAndSlotsStayFreeUntilThere) {
-  DrawnFrames source(8, [](double x, double y, std::size_t f) {
-    return f == 4 ? 0.0 : Drifting(x, y, f);
-  });
+  DrawnFrames source(
+      8, [](double x, double y, std::size_t f) { return f == 4 ? 0.0 : Drifting(x, y, f); });
   const Tracked run(source);
   EXPECT_THAT(run.statuses(3), Each(0));
   EXPECT_THAT(run.statuses(4), Each(feature_status::kLost));
@@ -170,9 +169,8 @@ TEST(TrackingRunTest, NewFeaturesKeepAwayFromLiveOnes) {
 }
 
 TEST(TrackingRunTest, SettingsThatSwitchThingsOff) {
-  DrawnFrames source(6, [](double x, double y, std::size_t f) {
-    return f == 3 ? 0.0 : Drifting(x, y, f);
-  });
+  DrawnFrames source(
+      6, [](double x, double y, std::size_t f) { return f == 3 ? 0.0 : Drifting(x, y, f); });
   TrackerParams off;
   off.affine_verification = false;
   const Tracked plain(source, off);

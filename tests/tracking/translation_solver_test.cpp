@@ -117,8 +117,8 @@ TEST(TranslationSolverTest, AStepIsTheLeastSquaresStep) {
   double xx = 0, xy = 0, yy = 0, bx = 0, by = 0;
   for (std::size_t k = 0; k < t.shape().samples(); ++k) {
     const double gx = t.planes().gx[k] / 2, gy = t.planes().gy[k] / 2;
-    const double r = t.planes().t[k] -
-                     (1.0 * regressed.state.gain[k % 3] * t.window[k] + regressed.state.bias[k % 3]);
+    const double r = t.planes().t[k] - (1.0 * regressed.state.gain[k % 3] * t.window[k] +
+                                        regressed.state.bias[k % 3]);
     xx += gx * gx, xy += gx * gy, yy += gy * gy, bx += gx * r, by += gy * r;
   }
   const double determinant = xx * yy - xy * xy;

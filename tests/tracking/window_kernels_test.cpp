@@ -177,8 +177,14 @@ TEST(WindowKernelsTest, AWindowIsInsideWhenEveryCornerIs) {
     const window_shape shape{2, 1, 3};
     const auto inside = [&](float x, float y, float m01 = 0.0f, float m10 = 0.0f) {
       const auto fx = x - std::floor(x), fy = y - std::floor(y);
-      const affine_sampling warp{static_cast<int>(std::floor(x)), static_cast<int>(std::floor(y)),
-                                 fx,  fy, 1.0f, m01, m10, 1.0f};
+      const affine_sampling warp{static_cast<int>(std::floor(x)),
+                                 static_cast<int>(std::floor(y)),
+                                 fx,
+                                 fy,
+                                 1.0f,
+                                 m01,
+                                 m10,
+                                 1.0f};
       return kernels::AffineWindowInside(warp, shape, 10, 8);
     };
     EXPECT_TRUE(inside(5, 4));

@@ -16,9 +16,7 @@ using testing::Picture;
 TEST(WindowStackTest, LimitsOfAWindowOf31DifferByOneBetweenTheAxes) {
   const ImagePyramid pyramid(1920, 1080, 3, 5);
   const window_shape shape{15, 15, 3};
-  const auto levels = [&](float x, float y) {
-    return CountWindowLevels(5, x, y, shape, pyramid);
-  };
+  const auto levels = [&](float x, float y) { return CountWindowLevels(5, x, y, shape, pyramid); };
   EXPECT_EQ(levels(16, 500), 1u);
   EXPECT_EQ(levels(15.999f, 500), 0u);
   EXPECT_EQ(levels(1902.99f, 500), 1u);
