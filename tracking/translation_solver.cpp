@@ -100,8 +100,16 @@ int SolveTranslation(const template_planes& level, const window_shape& shape,
                      const translation_normal& normal, const level_image& image, color_mode mode,
                      const solver_tolerances& tolerances, int max_iterations, AffineState& state,
                      float* window) {
-  // Never updates, so it can only run out of iterations.
-  if (mode == color_mode::unused) return max_iterations;
+  switch (mode) {
+    case color_mode::none:
+    case color_mode::joint:
+    case color_mode::regressed:
+      break;
+    case color_mode::unused:  // never updates, so it can only run out of iterations
+      return max_iterations;
+    default:  // a number read from settings
+      return kLevelFailed;
+  }
   channel_moments moments;
   if (mode == color_mode::regressed) moments = ChannelMoments(level.t, shape);
   for (int k = 0; k < max_iterations; ++k) {

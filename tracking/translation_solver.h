@@ -29,7 +29,7 @@ bool PrepareTranslation(const template_planes& level, const offset_planes& offse
 // 2004) by translation: iterates state.dx, dy (and gain, bias) until the steps are under the
 // tolerances. state.x, y: the template's position on this level. `window` receives the last sample.
 // Returns the iteration at which it converged, max_iterations, or kLevelFailed when the window
-// leaves the image.
+// leaves the image or the mode is not one of color_mode.
 int SolveTranslation(const template_planes& level, const window_shape& shape,
                      const translation_normal& normal, const level_image& image, color_mode mode,
                      const solver_tolerances& tolerances, int max_iterations, AffineState& state,

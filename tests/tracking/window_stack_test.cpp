@@ -1,0 +1,100 @@
+#include "tracking/window_stack.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+
+#include "tests/tracking/tracker_images.h"
+
+namespace marrow::tracking {
+namespace {
+
+using testing::kNaN;
+using testing::Picture;
+
+TEST(WindowStackTest, LimitsOfAWindowOf31DifferByOneBetweenTheAxes) {
+  const ImagePyramid pyramid(1920, 1080, 3, 5);
+  const window_shape shape{15, 15, 3};
+  const auto levels = [&](float x, float y) { return CountWindowLevels(5, x, y, shape, pyramid); };
+  EXPECT_EQ(levels(16, 500), 1u);
+  EXPECT_EQ(levels(15.999f, 500), 0u);
+  EXPECT_EQ(levels(1902.99f, 500), 1u);
+  EXPECT_EQ(levels(1903, 500), 0u);
+  EXPECT_EQ(levels(900, 16), 1u);
+  EXPECT_EQ(levels(900, 15.999f), 0u);
+  EXPECT_EQ(levels(900, 1061.99f), 1u);
+  EXPECT_EQ(levels(900, 1062), 0u);
+  // The fifth level has 120 x 68 pixels: columns 16 to 102, rows 16 to 49 of it.
+  EXPECT_EQ(levels(256, 500), 5u);
+  EXPECT_EQ(levels(255.9f, 500), 4u);
+  EXPECT_EQ(levels(1647.9f, 500), 5u);
+  EXPECT_EQ(levels(1648, 500), 4u);
+  EXPECT_EQ(levels(900, 256), 5u);
+  EXPECT_EQ(levels(900, 255.9f), 4u);
+  EXPECT_EQ(levels(900, 799.9f), 5u);
+  EXPECT_EQ(levels(900, 800), 4u);
+  EXPECT_EQ(CountWindowLevels(2, 900, 500, shape, pyramid), 2u);
+  EXPECT_EQ(CountWindowLevels(9, 900, 500, shape, pyramid), 5u) << "no more than the pyramid has";
+}
+
+TEST(WindowStackTest, SmallImagesAndPositionsThatAreNoNumbersHaveNoLevel) {
+  const window_shape shape{3, 3, 1};
+  EXPECT_EQ(CountWindowLevels(1, 4, 4, shape, ImagePyramid(10, 11, 1, 1)), 1u);
+  EXPECT_EQ(CountWindowLevels(1, 4, 4, shape, ImagePyramid(9, 11, 1, 1)), 0u);
+  EXPECT_EQ(CountWindowLevels(1, 4, 4, shape, ImagePyramid(10, 10, 1, 1)), 0u);
+  const ImagePyramid wide(100, 100, 1, 2);
+  for (const float bad : {kNaN, 1e30f, -1e30f, -50.0f, INFINITY}) {
+    EXPECT_EQ(CountWindowLevels(2, bad, 50, shape, wide), 0u);
+    EXPECT_EQ(CountWindowLevels(2, 50, bad, shape, wide), 0u);
+  }
+}
+
+// A product of coordinates is what bilinear interpolation reproduces exactly.
+TEST(WindowStackTest, PlanesOfEveryLevelShowTheWindowAndItsDifferences) {
+  const ImagePyramid pyramid = Picture(160, 144, 3, 3, [](double x, double y, double c) {
+    return x * y / 64 + 2 * x - c * y + 10 * c;
+  });
+  WindowStack stack(2, 2, 3, 3);
+  std::vector<float> scratch(WindowScratchSize(stack.shape), kNaN);
+  std::fill(stack.data.begin(), stack.data.end(), 0.0f);
+  const float x = 70.3f, y = 61.7f;
+  ASSERT_EQ(ExtractWindowStack(3, x, y, pyramid, stack, scratch.data()), 3u);
+  ASSERT_EQ(stack.levels_built, 3u);
+  for (int level = 0; level < 3; ++level) {
+    const double step = 1 << level;  // level-0 pixels to a pixel of the level
+    const template_planes planes = stack.Level(level);
+    for (int i = 0; i < 75; ++i) {
+      const int c = i % 3;
+      const double px = x + step * (i / 3 % 5 - 2), py = y + step * (i / 15 - 2);
+      ASSERT_NEAR(planes.t[i], px * py / 64 + 2 * px - c * py + 10 * c, 2e-3) << level << " " << i;
+      ASSERT_NEAR(planes.gx[i], 2 * step * (py / 64 + 2), 2e-3) << level << " " << i;
+      ASSERT_NEAR(planes.gy[i], 2 * step * (px / 64 - c), 2e-3) << level << " " << i;
+    }
+    for (std::size_t i = 75; i < stack.shape.plane_size(); ++i) ASSERT_EQ(planes.gy[i], 0.0f);
+  }
+}
+
+TEST(WindowStackTest, ExtractionAtTheLimitsStaysInsideTheImage) {
+  const auto value = [](double x, double y, double) { return 3 * x + 5 * y; };
+  const ImagePyramid pyramid = Picture(24, 22, 1, 1, value);
+  WindowStack stack(3, 3, 1, 1);
+  std::vector<float> scratch(WindowScratchSize(stack.shape));
+  for (const float x : {4.0f, 18.875f}) {
+    for (const float y : {4.0f, 15.875f}) {
+      ASSERT_EQ(ExtractWindowStack(1, x, y, pyramid, stack, scratch.data()), 1u);
+      for (int i = 0; i < 49; ++i) {
+        ASSERT_FLOAT_EQ(stack.Level(0).t[i], value(x + i % 7 - 3, y + i / 7 - 3, 0));
+        ASSERT_EQ(stack.Level(0).gx[i], 6.0f);
+        ASSERT_EQ(stack.Level(0).gy[i], 10.0f);
+      }
+    }
+  }
+  const std::vector<float> before = stack.data;
+  EXPECT_EQ(ExtractWindowStack(1, 3.9f, 9, pyramid, stack, scratch.data()), 0u);
+  EXPECT_EQ(stack.levels_built, 0u);
+  EXPECT_EQ(stack.data, before);
+}
+
+}  // namespace
+}  // namespace marrow::tracking
