@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "platform/tessel/debug.h"
+#include "stabilization/displacements.h"
 #include "stabilization/stabilizer_main.h"
 #include "synthetic/track_world.h"
 
@@ -92,14 +93,15 @@ inline solved_clip solve(stabilizer_global global, const SolverParamsRecord& par
   tessel::debug::SetSink([&](const std::string& text) {
     if (!text.starts_with("Frame ") && !text.starts_with("Not enough points")) clip.log += text;
   });
-  clip.result = stabilizer_main(clip.global, parameters, clip.transitions, clip.windows, 1920, 1080,
-                                [] {});
+  clip.result =
+      stabilizer_main(clip.global, parameters, clip.transitions, clip.windows, 1920, 1080, [] {});
   tessel::debug::SetSink({});
   tessel::debug::DebugDatabase::Set("ShowExperimentalEffectParameters", 0);
   return clip;
 }
 
-inline solved_clip solve(const synthetic::track_world& world, const SolverParamsRecord& parameters) {
+inline solved_clip solve(const synthetic::track_world& world,
+                         const SolverParamsRecord& parameters) {
   return solve(*world.global, parameters);
 }
 
@@ -109,6 +111,20 @@ inline double median(std::vector<double> values) {
   const auto middle = values.begin() + static_cast<std::ptrdiff_t>(values.size() / 2);
   std::nth_element(values.begin(), middle, values.end());
   return *middle;
+}
+
+// The positions that the warp of each frame goes by: windows blended where they overlap.
+inline std::vector<track_sample> blended_output(const solved_clip& clip,
+                                                const SolverParamsRecord& parameters) {
+  std::vector<track_sample> rows(clip.global.output.size(), {0, 0, -1, 0});
+  const displacement_lists lists = blended_displacements(clip.global, clip.windows, parameters);
+  for (std::size_t f = 0; f < lists.size(); ++f) {
+    for (const Displacement& d : lists[f]) {
+      rows[f * clip.global.feature_count + static_cast<std::size_t>(d.track->feature)] = {
+          static_cast<float>(d.targetX), static_cast<float>(d.targetY), 0, 0};
+    }
+  }
+  return rows;
 }
 
 // Root mean square of a track's second differences.
@@ -123,6 +139,14 @@ inline double roughness(const solved_clip& clip, const std::vector<track_sample>
     ++count;
   }
   return count == 0 ? NAN : std::sqrt(sum / count);
+}
+
+// Median over the tracks of their second difference about frame f, in pixels.
+inline double median_bend(const solved_clip& clip, const std::vector<track_sample>& rows,
+                          std::size_t f) {
+  std::vector<double> bends;
+  for (const Trajectory& t : clip.global.trajectories) bends.push_back(clip.bend(rows, t, f));
+  return median(bends);
 }
 
 // (I + lambda^2 D'D) u = signal, D the second difference: what a lone window does to a signal.

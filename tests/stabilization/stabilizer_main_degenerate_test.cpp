@@ -1,16 +1,16 @@
 #include <gtest/gtest.h>
 
+#include <boost/make_shared.hpp>
 #include <cmath>
 #include <string>
 #include <vector>
 
+#include "stabilization/cp_warper.h"
 #include "tests/stabilization/solve_clips.h"
 
 // Clips with little or nothing to go by.
 namespace marrow::stabilization {
 namespace {
-
-using ::testing::TestWithParam;
 
 stabilizer_global shaken(int frames, int slots, int first, int end, int slot_begin = 0) {
   stabilizer_global global = empty_table(frames, slots);
@@ -31,15 +31,62 @@ TEST(StabilizerMainDegenerate, StillPictureComesOutExact) {
   options.whole_clip = true;
   const solved_clip clip = solve(make_track_world(options), params_1080p());
   ASSERT_EQ(clip.result, 1);
-  // Nine signals are not there to be found.
-  EXPECT_NE(clip.log.find("stabilizer failed, trying lower rank 4\n"), std::string::npos);
-  ASSERT_EQ(clip.windows.size(), 1u);
-  EXPECT_LE(clip.windows.front().rank, 4u);
+  ASSERT_EQ(clip.window_spans(), "0 100;");
   for (std::size_t i = 0; i < clip.global.input.size(); ++i) {
     ASSERT_EQ(clip.global.output[i].x, clip.global.input[i].x);
     ASSERT_EQ(clip.global.output[i].y, clip.global.input[i].y);
   }
-  std::printf("rank %d\n", (int)clip.windows.front().rank);
+
+  CPWarper warper(100, 1920, 1080);
+  warper.buildDisplacements(boost::make_shared<stabilizer_global>(clip.global), clip.windows,
+                            clip.transitions, params_1080p(), [] {});
+  warper.drive([] {});
+  for (std::size_t f = 0; f < 100; ++f) {
+    const VarVector& grid = *warper.frameWarp(f);
+    for (int r = 0; r < grid.rows; ++r) {
+      for (int c = 0; c < grid.cols; ++c) {
+        ASSERT_NEAR(grid.vertex(c, r).x, c * warper.cellWidth(), 1e-8);
+        ASSERT_NEAR(grid.vertex(c, r).y, r * warper.cellHeight(), 1e-8);
+      }
+    }
+  }
+}
+
+// The ranks at which the solve was tried again, in order.
+std::string lower_ranks(const std::string& log) {
+  const std::string line = "stabilizer failed, trying lower rank ";
+  std::string ranks;
+  for (std::size_t at = log.find(line); at != std::string::npos; at = log.find(line, at + 1)) {
+    ranks += log[at + line.size()];
+  }
+  return ranks;
+}
+
+TEST(StabilizerMainDegenerate, RankFallsToWhatTheTracksHold) {
+  // All tracks on one still point: one signal, and every other coefficient a multiple of its own.
+  stabilizer_global point = empty_table(100, 50);
+  for (int s = 0; s < 50; ++s) {
+    put_track(point, s, 0, 100, [](int) { return point2{512, 512}; });
+  }
+  const solved_clip clip = solve(std::move(point), params_1080p());
+  ASSERT_EQ(clip.result, 1);
+  EXPECT_EQ(lower_ranks(clip.log), "421");
+  ASSERT_EQ(clip.window_spans(), "0 100;");
+  EXPECT_EQ(clip.windows.front().rank, 1u);
+  for (const track_sample& s : clip.global.output) {
+    ASSERT_NEAR(s.x, 512, 1e-4);
+    ASSERT_NEAR(s.y, 512, 1e-4);
+  }
+}
+
+TEST(StabilizerMainDegenerate, TracksAtTheOriginHoldNothing) {
+  stabilizer_global origin = empty_table(100, 50);
+  for (int s = 0; s < 50; ++s) put_track(origin, s, 0, 100, [](int) { return point2{0, 0}; });
+  const solved_clip clip = solve(std::move(origin), params_1080p());
+  EXPECT_EQ(clip.result, 0);
+  EXPECT_EQ(lower_ranks(clip.log), "4210");
+  EXPECT_TRUE(clip.windows.empty());
+  EXPECT_TRUE(clip.transitions.empty());
 }
 
 TEST(StabilizerMainDegenerate, FullRankIsKeptByAnyRealMotion) {
@@ -66,26 +113,23 @@ TEST(StabilizerMainDegenerate, FewerFramesThanTheRank) {
                             std::to_string(frames) + ")."),
               std::string::npos);
     EXPECT_TRUE(clip.windows.empty());
-    std::printf("%d frames %s\n", frames, clip.transition_spans().c_str());
-    ASSERT_EQ(clip.transitions.size(), 1u);
-    EXPECT_EQ(clip.transitions.front().first, 0u);
-    EXPECT_EQ(clip.transitions.front().end, static_cast<std::uint64_t>(frames));
+    // Tracks of fewer than five frames do not count.
+    EXPECT_EQ(clip.transition_spans(),
+              (frames < 5 ? "unsolved 0 " : "solved 0 ") + std::to_string(frames) + ";");
   }
 }
 
 TEST(StabilizerMainDegenerate, FewerTracksThanHalfTheRank) {
   // Four slots are too few by the table, eight slots with four tracks by the scan.
   for (const int slots : {1, 2, 4, 8}) {
-    const solved_clip clip =
-        solve(shaken(120, slots, 0, 120, slots == 8 ? 4 : 0), params_1080p());
+    const solved_clip clip = solve(shaken(120, slots, 0, 120, slots == 8 ? 4 : 0), params_1080p());
     ASSERT_EQ(clip.result, 1) << slots;
     EXPECT_EQ(clip.log.find("disabled"), std::string::npos);
     EXPECT_TRUE(clip.windows.empty());
     EXPECT_EQ(clip.transition_spans(), slots == 1 ? "unsolved 0 120;" : "solved 0 120;");
     if (slots < 4) continue;
     const Trajectory& t = clip.global.trajectories.front();
-    EXPECT_LT(roughness(clip, clip.global.output, t),
-              0.2 * roughness(clip, clip.global.input, t));
+    EXPECT_LT(roughness(clip, clip.global.output, t), 0.2 * roughness(clip, clip.global.input, t));
   }
 }
 
@@ -104,46 +148,67 @@ TEST(StabilizerMainDegenerate, NothingTracked) {
   }
 }
 
+// 100 tracks fade by 0.01 a frame each, so they hold 7.5 up to frame 112; a window of 113 frames at
+// most ends at 110, as it grows from 40 by fives.
 TEST(StabilizerMainDegenerate, EverythingDiesAtOnce) {
-  // All tracks end in mid-clip and nothing follows.
   const solved_clip clip = solve(shaken(200, 100, 0, 120), params_1080p());
   ASSERT_EQ(clip.result, 1);
-  std::printf("dies: %s %s\n", clip.window_spans().c_str(), clip.transition_spans().c_str());
+  EXPECT_EQ(clip.window_spans(), "0 110;");
+  EXPECT_EQ(clip.transition_spans(), "solved 110 120;unsolved 120 200;");
+  for (const Trajectory& t : clip.global.trajectories) {
+    EXPECT_LT(roughness(clip, clip.global.output, t), 0.1);
+    EXPECT_GT(roughness(clip, clip.global.input, t), 10);
+  }
 }
 
+// All tracks end at a cut and others begin: as 200 hold 7.5 up to frame 146 and from 153 on, the
+// windows are [0, 145) and [153, 300) with a transition over the cut.
 TEST(StabilizerMainDegenerate, SceneCut) {
   stabilizer_global global = empty_table(300, 200);
   for (int s = 0; s < 200; ++s) {
-    put_track(global, s, 0, 150, [&](int f) {
-      return point2{scattered(s).x + 8 * std::sin(1.7 * f), scattered(s).y + 6 * std::cos(2.9 * f)};
-    });
-    put_track(global, s, 150, 300, [&](int f) {
-      return point2{scattered(s + 7).x + 8 * std::sin(1.7 * f),
-                    scattered(s + 7).y + 6 * std::cos(2.9 * f)};
-    });
+    for (const int first : {0, 150}) {
+      put_track(global, s, first, first + 150, [&](int f) {
+        const point2 p = scattered(s + first);
+        return point2{p.x + 8 * std::sin(1.7 * f), p.y + 6 * std::cos(2.9 * f)};
+      });
+    }
   }
   const solved_clip clip = solve(std::move(global), params_1080p());
   ASSERT_EQ(clip.result, 1);
-  std::printf("cut: %s %s\n", clip.window_spans().c_str(), clip.transition_spans().c_str());
+  EXPECT_EQ(clip.window_spans(), "0 145;153 300;");
+  EXPECT_EQ(clip.transition_spans(), "solved 145 163;");
+  const std::vector<track_sample> blended = blended_output(clip, params_1080p());
+  for (std::size_t f = 1; f + 1 < 300; ++f) {
+    if (f == 149 || f == 150) continue;  // no track lives on both sides
+    EXPECT_LT(median_bend(clip, blended, f), 0.3) << "frame " << f;
+  }
 }
 
+// Frames without any track between two windows: each is bridged to its side of them.
 TEST(StabilizerMainDegenerate, HoleInTheMiddle) {
   synthetic::track_world_options options;
-  options.frame_count = 300;
   options.slots = 300;
   options.mean_life = 200;
+  options.scene = synthetic::track_scene::similarity;  // what a transition can follow
   options.hole = {140, 160};
   const solved_clip clip = solve(make_track_world(options), params_1080p());
   ASSERT_EQ(clip.result, 1);
-  std::printf("hole: %s %s\n", clip.window_spans().c_str(), clip.transition_spans().c_str());
+  ASSERT_EQ(clip.windows.size(), 2u);
+  const std::uint64_t end = clip.windows[0].end, first = clip.windows[1].first;
+  EXPECT_GE(end, 120u);
+  EXPECT_LE(first, 180u);
+  EXPECT_EQ(clip.transition_spans(), "solved " + std::to_string(end) +
+                                         " 140;unsolved 140 160;solved 160 " +
+                                         std::to_string(first + 10) + ";");
+  // In a transition the tracks keep their noise of 0.1 pixels, which bends them by 0.3.
+  const std::vector<track_sample> blended = blended_output(clip, params_1080p());
   for (std::size_t f = 1; f + 1 < 300; ++f) {
-    std::vector<double> bends;
-    for (const Trajectory& t : clip.global.trajectories) {
-      bends.push_back(clip.bend(clip.global.output, t, f));
-    }
-    double m = median(bends);
-    if (m > 0.1) std::printf("  %zu: %g\n", f, m);
+    if (f >= 139 && f <= 160) continue;
+    EXPECT_LT(median_bend(clip, blended, f), 0.5) << "frame " << f;
+    EXPECT_GT(median_bend(clip, clip.global.input, f), 1.0);
   }
+  EXPECT_LT(median_bend(clip, blended, 100), 0.15);
+  EXPECT_LT(median_bend(clip, blended, 220), 0.15);
 }
 
 }  // namespace

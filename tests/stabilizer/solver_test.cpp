@@ -5,8 +5,11 @@
 #include <atomic>
 #include <cmath>
 #include <memory>
+#include <random>
+#include <thread>
 
 #include "stabilizer/effect/src/parameter_rules.h"
+#include "synthetic/track_world.h"
 
 namespace {
 
@@ -90,6 +93,45 @@ TEST(SolverTest, DroppingBeforeTheTaskBeginsAndWhileItRuns) {
     if (i % 2 != 0) {
       while (solver->GetProgress() < 0.05f * static_cast<float>(i)) {
       }
+    }
+    solver.reset();
+  }
+}
+
+// Tracks that come and go, two windows with a bridge over a hole between them; dropped at 50 points
+// all over the solve, in its factorizations, linear solves, warps and crop.
+TEST(SolverTest, DroppedAnywhere) {
+  synthetic::track_world_options options;
+  options.width = kWidth;
+  options.height = kHeight;
+  options.focal = 500;
+  options.frame_count = 48;
+  options.slots = 60;
+  options.mean_life = 100;
+  options.hole = {24, 26};
+  const AllFeatures table = make_track_world(options).features;
+  SolverParamsRecord parameters = Params();
+  parameters.duration = 12;
+  parameters.factorization_window_overlap = 8;
+  parameters.track_fade_duration = 10;
+  const auto start = [&] {
+    auto solver = std::make_unique<Solver>(kWidth, kHeight, table, 0, parameters, true);
+    solver->Start();
+    return solver;
+  };
+  const auto whole = start();
+  whole->Wait();
+  ASSERT_EQ(whole->GetState(), Solver::finished);
+  ASSERT_GT(whole->GetFactorizationWindows().size(), 1u);
+  ASSERT_FALSE(whole->GetTransitionWindows().empty());
+
+  std::mt19937 random(4);
+  std::uniform_real_distribution<float> share(0, 1);
+  for (int i = 0; i < 50; ++i) {
+    const float until = share(random);
+    auto solver = start();
+    while (solver->GetProgress() < until && solver->GetState() <= Solver::running) {
+      std::this_thread::yield();
     }
     solver.reset();
   }
