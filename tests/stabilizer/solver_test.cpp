@@ -85,6 +85,38 @@ TEST(SolverTest, ResultsOutliveTheSolver) {
   EXPECT_EQ(warper->frameWarpCount(), 20u);
 }
 
+// Clips with little to go by still get a finite warp for every frame.
+TEST(SolverTest, DegenerateTablesFinish) {
+  const auto filled = [](std::int32_t frames, std::int32_t status) {
+    AllFeatures table;
+    table.feature_count = 40;
+    table.frame_count = frames;
+    table.features->assign(static_cast<std::size_t>(40 * frames), {0, 0, status, 0});
+    return table;
+  };
+  AllFeatures dying = ShakenTable(60, 40);
+  for (std::size_t i = 30 * 40; i < dying.features->size(); ++i) (*dying.features)[i].status = -1;
+  AllFeatures holed = ShakenTable(120, 80);
+  for (std::size_t f = 50; f < 70; ++f) {
+    for (std::size_t s = 0; s < 80; ++s) (*holed.features)[f * 80 + s].status = -1;
+  }
+  for (std::size_t s = 0; s < 80; ++s) (*holed.features)[70 * 80 + s].status = 71;
+  const AllFeatures tables[] = {
+      filled(1, -1),      filled(1, 0),       filled(30, -1), filled(30, 0), ShakenTable(1, 40),
+      ShakenTable(3, 40), ShakenTable(60, 3), dying,          holed};
+  for (const AllFeatures& table : tables) {
+    auto solver = NewSolver(table);
+    solver->Run();
+    ASSERT_EQ(solver->GetState(), Solver::finished) << &table - tables;
+    const CPWarper& warper = *solver->GetWarper();
+    ASSERT_EQ(warper.frameWarpCount(), static_cast<std::size_t>(table.frame_count));
+    for (std::size_t f = 0; f < warper.frameWarpCount(); ++f) {
+      for (const double v : warper.frameWarp(f)->values) ASSERT_TRUE(std::isfinite(v));
+    }
+    EXPECT_TRUE(solver->GetCropper());
+  }
+}
+
 TEST(SolverTest, DroppingBeforeTheTaskBeginsAndWhileItRuns) {
   const AllFeatures table = ShakenTable(200, 100);
   for (int i = 0; i < 10; ++i) {
