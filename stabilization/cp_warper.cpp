@@ -83,14 +83,14 @@ void CPWarper::buildDisplacements(boost::shared_ptr<const stabilizer_global> sta
   homographyLimit_ = parameters.homography_limit;
   global_ = std::move(stabilizerGlobal);
   solving_ = nullptr;
-  frameDisplacements_ = blended_displacements(*global_, factorizationWindows, parameters);
+  frameDisplacements_ = blended_displacements(*global_, factorizationWindows, parameters, progress);
   frameDisplacements_.resize(static_cast<std::size_t>(frameCount_));
   progress();
   computeModelScores(factorizationWindows, transitionWindows, parameters.method_level);
   progress();
-  limitByDeviation();
+  limitByDeviation(progress);
   progress();
-  limitByHomographySanity();
+  limitByHomographySanity(progress);
 }
 
 void CPWarper::buildDisplacementsForWindows(stabilizer_global& stabilizerGlobal,

@@ -67,8 +67,10 @@ class CPWarper {
   void drive(const progress_functor& progress);
   bool driven() const { return driven_; }
 
-  // Fills the frame-to-frame map; radius in frames, 0 makes it empty.
-  void makeFrameMap(std::uint32_t radius);
+  // Fills the frame-to-frame map; radius in frames, 0 makes it empty. What progress throws leaves
+  // the map as it was.
+  void makeFrameMap(
+      std::uint32_t radius, const progress_functor& progress = [] {});
   const boost::shared_ptr<const MtoNMap>& frameMap() const { return frameMap_; }
   void setFrameMap(boost::shared_ptr<const MtoNMap> map) { frameMap_ = std::move(map); }
 
@@ -122,8 +124,8 @@ class CPWarper {
   void computeModelScores(const std::vector<factorization_window>& windows,
                           const std::vector<transition_record>& transitionWindows,
                           double methodLevel);
-  void limitByDeviation();
-  void limitByHomographySanity();
+  void limitByDeviation(const progress_functor& progress);
+  void limitByHomographySanity(const progress_functor& progress);
   void checkConsistency(std::size_t frame) const;
   matrix3 storedSimilarity(std::size_t frame) const;
 

@@ -80,11 +80,13 @@ void append_track(displacement_lists& lists, const stabilizer_global& global,
 
 displacement_lists blended_displacements(const stabilizer_global& global,
                                          const std::vector<factorization_window>& windows,
-                                         const SolverParamsRecord& parameters) {
+                                         const SolverParamsRecord& parameters,
+                                         const progress_functor& progress) {
   const std::vector<std::int32_t> owner = window_of_frame(
       global.frame_count, windows, [](const factorization_window& w) { return w.overlap_end; });
   displacement_lists lists = empty_lists(global);
   for (const Trajectory& track : global.trajectories) {
+    progress();
     const auto stabilized = [&](std::int32_t f) -> const track_sample* {
       const track_sample& sample = global.output_at(f, track.feature);
       return sample.status < 0 ? nullptr : &sample;

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <vector>
 
+#include "stabilization/progress.h"
 #include "stabilization/solve_records.h"
 #include "stabilization/solver_params.h"
 
@@ -31,10 +32,10 @@ using displacement_lists = std::vector<std::vector<Displacement>>;
 // The displacements of a solved clip: a record for each frame from a track's first stabilized
 // sample to its first frame without one. Across the start of a window, [first, overlap_end), the
 // target moves from the window's overlap_rows to global.output, linearly in time. Tracks shorter
-// than parameters.track_fade_minimum make no record.
-displacement_lists blended_displacements(const stabilizer_global& global,
-                                         const std::vector<factorization_window>& windows,
-                                         const SolverParamsRecord& parameters);
+// than parameters.track_fade_minimum make no record. A progress call goes ahead of each track.
+displacement_lists blended_displacements(
+    const stabilizer_global& global, const std::vector<factorization_window>& windows,
+    const SolverParamsRecord& parameters, const progress_functor& progress = [] {});
 
 // The displacements of a clip that is still being solved: for each track the frames from the first
 // whose window it takes part in to the first whose window it does not take part in, or which has no

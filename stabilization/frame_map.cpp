@@ -79,17 +79,19 @@ bool CPWarper::warpedGridOfFrame(std::int32_t M, std::int32_t N, std::vector<dou
   return true;
 }
 
-void CPWarper::makeFrameMap(std::uint32_t radius) {
+void CPWarper::makeFrameMap(std::uint32_t radius, const progress_functor& progress) {
   constexpr std::uint32_t kMost = std::numeric_limits<std::int32_t>::max();
   frameMap_ = boost::make_shared<const MtoNMap>(
-      frameCount_, static_cast<std::int32_t>(std::min(radius, kMost)), *this);
+      frameCount_, static_cast<std::int32_t>(std::min(radius, kMost)), *this, progress);
 }
 
-MtoNMap::MtoNMap(std::int32_t frameCount, std::int32_t radius, const CPWarper& warper)
+MtoNMap::MtoNMap(std::int32_t frameCount, std::int32_t radius, const CPWarper& warper,
+                 const progress_functor& progress)
     : frameCount_(frameCount), radius_(radius) {
   // No pair lies further apart than the clip is long.
   const std::int32_t reach = std::min(radius, frameCount);
   for (std::int32_t m = 0; m < frameCount; ++m) {
+    if (reach > 0) progress();
     const std::int32_t last = std::min(m + reach, frameCount - 1);
     for (std::int32_t n = std::max(m - reach, 0); n <= last; ++n) {
       matrix3 motion;

@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "stabilization/matrix3.h"
+#include "stabilization/progress.h"
 
 namespace marrow::stabilization {
 
@@ -18,8 +19,9 @@ class MtoNMap {
   using entries_t = std::map<std::pair<std::int32_t, std::int32_t>, matrix3>;
 
   // Every pair at most radius frames apart that has enough tracks in common. The warper must have
-  // been driven in this process.
-  MtoNMap(std::int32_t frameCount, std::int32_t radius, const CPWarper& warper);
+  // been driven in this process. A progress call goes ahead of each frame.
+  MtoNMap(std::int32_t frameCount, std::int32_t radius, const CPWarper& warper,
+          const progress_functor& progress);
   // As read from a project.
   MtoNMap(std::int32_t frameCount, std::int32_t radius, entries_t entries);
 

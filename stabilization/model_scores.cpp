@@ -96,8 +96,9 @@ matrix3 CPWarper::storedSimilarity(std::size_t frame) const {
   return similarity_matrix(p[0], p[1], p[2], p[3]);
 }
 
-void CPWarper::limitByDeviation() {
+void CPWarper::limitByDeviation(const progress_functor& progress) {
   for (std::size_t f = 0; f < frameDisplacements_.size(); ++f) {
+    progress();
     const double median = medianDeviation(frameDisplacements_[f]);
     if (median / frameWidth_ > kLargestDeviation && modelScore_[f] > kSimilarityScore) {
       modelScore_[f] = kSimilarityScore;
@@ -105,14 +106,15 @@ void CPWarper::limitByDeviation() {
                          static_cast<int>(f));
     }
   }
-  fade_about_outliers(frameDisplacements_, 0, frameCount_, kOutlierRampFrames);
+  fade_about_outliers(frameDisplacements_, 0, frameCount_, kOutlierRampFrames, progress);
 }
 
-void CPWarper::limitByHomographySanity() {
+void CPWarper::limitByHomographySanity(const progress_functor& progress) {
   homography_fitter homography;
   for (std::size_t f = 0; f < frameDisplacements_.size(); ++f) {
     const std::vector<Displacement>& list = frameDisplacements_[f];
     if (list.size() <= kMostEntriesExemptFromSanity) continue;
+    progress();
     const double error = entry_distance(fitSimilarity(list), homography.fit(list));
     if (!(error < homographyLimit_) && modelScore_[f] > kSimilarityScore) {
       modelScore_[f] = kSimilarityScore;

@@ -93,7 +93,7 @@ std::uint64_t moving_factorizer::Factorize(const stabilizer_global& global, std:
   const std::size_t length = end - first;
   window.basis.resize(rank_ * length);
   for (std::size_t i = 0; i < rank_; ++i) {
-    std::copy_n(basis_row(i) + first, length, &window.basis[i * length]);
+    std::copy_n(basis_row(i) + first, length, window.basis.data() + i * length);
   }
   if (!FitAllTrajectories(window, progress)) return 0;
   return end;

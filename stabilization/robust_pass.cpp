@@ -43,8 +43,9 @@ double medianDeviation(std::span<Displacement> list) {
 }
 
 void fade_about_outliers(displacement_lists& lists, std::int32_t first, std::int32_t end,
-                         std::int32_t ramp_frames) {
+                         std::int32_t ramp_frames, const progress_functor& progress) {
   for (std::int32_t f = first; f < end; ++f) {
+    progress();
     for (const Displacement& outlier : lists[f]) {
       if (!outlier.outlier) continue;
       const auto limit = [&](Displacement& reached, std::int32_t k) {

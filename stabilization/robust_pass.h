@@ -4,6 +4,7 @@
 #include <span>
 
 #include "stabilization/displacements.h"
+#include "stabilization/progress.h"
 
 namespace marrow::stabilization {
 
@@ -16,7 +17,8 @@ double medianDeviation(std::span<Displacement> list);
 // Lets every outlier of frames [first, end) fade in and out along its track: k frames away, inside
 // that range, the weight is at most k / ramp_frames more than the outlier's, for k up to
 // ramp_frames.
-void fade_about_outliers(displacement_lists& lists, std::int32_t first, std::int32_t end,
-                         std::int32_t ramp_frames);
+void fade_about_outliers(
+    displacement_lists& lists, std::int32_t first, std::int32_t end, std::int32_t ramp_frames,
+    const progress_functor& progress = [] {});
 
 }  // namespace marrow::stabilization

@@ -23,7 +23,9 @@ struct DssSolver {
   DssSolver() {
     cholmod_start(&common);
     common.print = 0;
-    common.supernodal = CHOLMOD_SUPERNODAL;
+    // The supernodal loops start a team of threads of their own for each thread that solves,
+    // whatever OpenMP is told; the systems here are narrow bands that gain nothing from it.
+    common.supernodal = CHOLMOD_SIMPLICIAL;
     common.final_ll = 1;  // never LDL': a negative pivot must be a failure
     common.quick_return_if_not_posdef = 1;
   }
@@ -48,17 +50,11 @@ DssInt Status(const cholmod_common& common) {
 
 // CHOLMOD's own test for a non-positive pivot lets NaN through.
 bool DiagonalIsPositive(const cholmod_factor& factor) {
-  const auto* super = static_cast<const int*>(factor.super);
-  const auto* pi = static_cast<const int*>(factor.pi);
-  const auto* px = static_cast<const int*>(factor.px);
+  const auto* starts = static_cast<const int*>(factor.p);  // a column begins with its diagonal
   const auto* x = static_cast<const double*>(factor.x);
-  for (std::size_t s = 0; s < factor.nsuper; ++s) {
-    const int rows = pi[s + 1] - pi[s];
-    const int columns = super[s + 1] - super[s];
-    for (int c = 0; c < columns; ++c) {
-      const double pivot = x[px[s] + c * rows + c];
-      if (!(pivot > 0.0) || !std::isfinite(pivot)) return false;
-    }
+  for (std::size_t column = 0; column < factor.n; ++column) {
+    const double pivot = x[starts[column]];
+    if (!(pivot > 0.0) || !std::isfinite(pivot)) return false;
   }
   return true;
 }

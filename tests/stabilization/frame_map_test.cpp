@@ -43,6 +43,19 @@ TEST(FrameMapTest, APairForEveryNeighbourWithinTheRadius) {
   EXPECT_TRUE(warper->frameMap()->entries().empty());
 }
 
+TEST(FrameMapTest, ProgressMayEndItAndLeavesTheMapAsItWas) {
+  struct cancelled {};
+  auto warper = driven(panning(20, 9), 2);
+  warper->makeFrameMap(1);
+  const auto before = warper->frameMap();
+  int left = 4;
+  const progress_functor progress = [&] {
+    if (left-- == 0) throw cancelled();
+  };
+  EXPECT_THROW(warper->makeFrameMap(2, progress), cancelled);
+  EXPECT_EQ(warper->frameMap(), before);
+}
+
 TEST(FrameMapTest, SixSharedTracksMakeAnEntryAndFiveDoNot) {
   for (const int shared : {5, 6}) {
     auto global = panning(shared + 8, 6);

@@ -21,8 +21,7 @@ struct life {
 // Tracks that are exact mixtures of `rank` smooth signals, each in a slot of its own, as f32.
 class LowRankClip {
  public:
-  LowRankClip(int frames, int rank, const std::vector<life>& lives, unsigned seed = 1)
-      : frames_(frames), rank_(rank) {
+  LowRankClip(int frames, int rank, const std::vector<life>& lives, unsigned seed = 1) {
     std::mt19937 random(seed);
     std::normal_distribution<double> normal;
     global.frame_count = static_cast<std::uint64_t>(frames);
@@ -78,8 +77,6 @@ class LowRankClip {
   stabilizer_global global;
 
  private:
-  int frames_;
-  int rank_;
   std::vector<int> order_;
 };
 

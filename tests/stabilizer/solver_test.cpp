@@ -5,8 +5,11 @@
 #include <atomic>
 #include <cmath>
 #include <memory>
+#include <random>
+#include <thread>
 
 #include "stabilizer/effect/src/parameter_rules.h"
+#include "synthetic/track_world.h"
 
 namespace {
 
@@ -82,6 +85,38 @@ TEST(SolverTest, ResultsOutliveTheSolver) {
   EXPECT_EQ(warper->frameWarpCount(), 20u);
 }
 
+// Clips with little to go by still get a finite warp for every frame.
+TEST(SolverTest, DegenerateTablesFinish) {
+  const auto filled = [](std::int32_t frames, std::int32_t status) {
+    AllFeatures table;
+    table.feature_count = 40;
+    table.frame_count = frames;
+    table.features->assign(static_cast<std::size_t>(40 * frames), {0, 0, status, 0});
+    return table;
+  };
+  AllFeatures dying = ShakenTable(60, 40);
+  for (std::size_t i = 30 * 40; i < dying.features->size(); ++i) (*dying.features)[i].status = -1;
+  AllFeatures holed = ShakenTable(120, 80);
+  for (std::size_t f = 50; f < 70; ++f) {
+    for (std::size_t s = 0; s < 80; ++s) (*holed.features)[f * 80 + s].status = -1;
+  }
+  for (std::size_t s = 0; s < 80; ++s) (*holed.features)[70 * 80 + s].status = 71;
+  const AllFeatures tables[] = {
+      filled(1, -1),      filled(1, 0),       filled(30, -1), filled(30, 0), ShakenTable(1, 40),
+      ShakenTable(3, 40), ShakenTable(60, 3), dying,          holed};
+  for (const AllFeatures& table : tables) {
+    auto solver = NewSolver(table);
+    solver->Run();
+    ASSERT_EQ(solver->GetState(), Solver::finished) << &table - tables;
+    const CPWarper& warper = *solver->GetWarper();
+    ASSERT_EQ(warper.frameWarpCount(), static_cast<std::size_t>(table.frame_count));
+    for (std::size_t f = 0; f < warper.frameWarpCount(); ++f) {
+      for (const double v : warper.frameWarp(f)->values) ASSERT_TRUE(std::isfinite(v));
+    }
+    EXPECT_TRUE(solver->GetCropper());
+  }
+}
+
 TEST(SolverTest, DroppingBeforeTheTaskBeginsAndWhileItRuns) {
   const AllFeatures table = ShakenTable(200, 100);
   for (int i = 0; i < 10; ++i) {
@@ -90,6 +125,45 @@ TEST(SolverTest, DroppingBeforeTheTaskBeginsAndWhileItRuns) {
     if (i % 2 != 0) {
       while (solver->GetProgress() < 0.05f * static_cast<float>(i)) {
       }
+    }
+    solver.reset();
+  }
+}
+
+// Tracks that come and go, two windows with a bridge over a hole between them; dropped at 50 points
+// all over the solve, in its factorizations, linear solves, warps and crop.
+TEST(SolverTest, DroppedAnywhere) {
+  synthetic::track_world_options options;
+  options.width = kWidth;
+  options.height = kHeight;
+  options.focal = 500;
+  options.frame_count = 48;
+  options.slots = 60;
+  options.mean_life = 100;
+  options.hole = {24, 26};
+  const AllFeatures table = make_track_world(options).features;
+  SolverParamsRecord parameters = Params();
+  parameters.duration = 12;
+  parameters.factorization_window_overlap = 8;
+  parameters.track_fade_duration = 10;
+  const auto start = [&] {
+    auto solver = std::make_unique<Solver>(kWidth, kHeight, table, 0, parameters, true);
+    solver->Start();
+    return solver;
+  };
+  const auto whole = start();
+  whole->Wait();
+  ASSERT_EQ(whole->GetState(), Solver::finished);
+  ASSERT_GT(whole->GetFactorizationWindows().size(), 1u);
+  ASSERT_FALSE(whole->GetTransitionWindows().empty());
+
+  std::mt19937 random(4);
+  std::uniform_real_distribution<float> share(0, 1);
+  for (int i = 0; i < 50; ++i) {
+    const float until = share(random);
+    auto solver = start();
+    while (solver->GetProgress() < until && solver->GetState() <= Solver::running) {
+      std::this_thread::yield();
     }
     solver.reset();
   }

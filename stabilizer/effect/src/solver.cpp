@@ -73,7 +73,7 @@ void Solver::Run() {
 
 void Solver::Execute() {
   if (warper) {
-    warper->makeFrameMap(frameMapRadius);
+    warper->makeFrameMap(frameMapRadius, MakeProgressFunctor());
     return;
   }
   auto global = boost::make_shared<stabilizer_global>();
@@ -117,7 +117,7 @@ void Solver::MakeWarperUsingFactorization(CPWarper& newWarper) {
     poll();
     ReportShare(kFactorizationShare, kWarperShare, newWarper.frameWarpCount());
   });
-  newWarper.makeFrameMap(frameMapRadius);
+  newWarper.makeFrameMap(frameMapRadius, poll);
 }
 
 boost::shared_ptr<cropper> Solver::MakeCropper() {
