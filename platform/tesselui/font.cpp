@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <limits>
 
+#include "platform/tessel/utility.h"
 #include "platform/tesselui/text_layout.h"
 
 namespace tesselui {
@@ -28,7 +29,7 @@ TextLayout::TextLayout(const Font& font, const std::string& text)
     : lock_(font_mutex()),
       context_(pango_font_map_create_context(FontMap())),
       layout_(pango_layout_new(context_.get())) {
-  // Grey edges and unhinted advances: the same picture whatever the desktop's settings are.
+  // Grey edges without hints: the same picture whatever the desktop's settings are.
   cairo_font_options_t* options = cairo_font_options_create();
   cairo_font_options_set_antialias(options, CAIRO_ANTIALIAS_GRAY);
   cairo_font_options_set_hint_style(options, CAIRO_HINT_STYLE_NONE);
@@ -41,8 +42,10 @@ TextLayout::TextLayout(const Font& font, const std::string& text)
   pango_font_description_set_absolute_size(description, font.pixels() * PANGO_SCALE);
   pango_layout_set_font_description(layout_.get(), description);
   pango_font_description_free(description);
+  const std::string valid = tessel::utility::ToUTF8(tessel::utility::ToUTF16(text));
   const std::size_t most = std::numeric_limits<int>::max();
-  pango_layout_set_text(layout_.get(), text.data(), static_cast<int>(std::min(text.size(), most)));
+  pango_layout_set_text(layout_.get(), valid.data(),
+                        static_cast<int>(std::min(valid.size(), most)));
 }
 
 Font Font::HostFont() {

@@ -27,14 +27,15 @@ TEST(SerializationTest, KeysKeepTheirOrderAndTextsAreEscaped) {
 TEST(SerializationTest, NumbersKeepAllTheirBits) {
   const std::int64_t lowest = std::numeric_limits<std::int64_t>::min();
   const std::uint64_t highest = std::numeric_limits<std::uint64_t>::max();
+  const char* const keys[] = {"a", "b", "c", "d", "e", "f"};
   const double floats[] = {0.1, -0.0, 1.0f / 3, 5e-324, std::numeric_limits<double>::max(), 2.0};
   Value value = {{"lowest", lowest}, {"highest", highest}};
-  for (std::size_t i = 0; i < std::size(floats); ++i) value["f" + std::to_string(i)] = floats[i];
+  for (std::size_t i = 0; i < std::size(floats); ++i) value[keys[i]] = floats[i];
   const Value read = JSONParse(GetJSONString(value));
   EXPECT_EQ(GetInteger<std::int64_t>(read, "lowest"), lowest);
   EXPECT_EQ(GetInteger<std::uint64_t>(read, "highest"), highest);
   for (std::size_t i = 0; i < std::size(floats); ++i) {
-    EXPECT_EQ(std::bit_cast<std::uint64_t>(GetFloat(read, "f" + std::to_string(i))),
+    EXPECT_EQ(std::bit_cast<std::uint64_t>(GetFloat(read, keys[i])),
               std::bit_cast<std::uint64_t>(floats[i]));
   }
   EXPECT_THROW(GetJSONString({{"a", {1, {{"b", std::nan("")}}}}}), Error);
