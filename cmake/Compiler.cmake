@@ -1,9 +1,12 @@
-# Language, warnings and sanitizers. Warnings stop a build only where CALMFRAME_WERROR asks for it (the checks), so that a
+# Languages, warnings and sanitizers. Warnings stop a build only where CALMFRAME_WERROR asks for it (the checks), so that a
 # newer compiler's new warnings never stop someone who just wants the program.
 
 set(CMAKE_CXX_STANDARD 20)
 set(CMAKE_CXX_STANDARD_REQUIRED ON)
 set(CMAKE_CXX_EXTENSIONS OFF)
+set(CMAKE_C_STANDARD 11)
+set(CMAKE_C_STANDARD_REQUIRED ON)
+set(CMAKE_C_EXTENSIONS OFF)
 set(CMAKE_POSITION_INDEPENDENT_CODE ON)
 set(CMAKE_EXPORT_COMPILE_COMMANDS ON)
 

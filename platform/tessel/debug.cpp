@@ -28,20 +28,22 @@ class Database {
     Publish();
   }
 
-  int Get(const std::string& name) {
+  int Get(const std::string& name, int unless_set) {
     std::lock_guard<std::mutex> lock(mutex_);
     const auto found = values_.find(name);
-    return found == values_.end() ? 0 : found->second;
+    return found == values_.end() ? unless_set : found->second;
   }
 
   void Set(const std::string& name, int value) {
     std::lock_guard<std::mutex> lock(mutex_);
     values_[name] = value;
+    change_count_.fetch_add(1, std::memory_order_relaxed);
     Publish();
   }
 
   // The log is asked from inner loops, where it must cost one load.
   bool log_enabled() const { return log_enabled_.load(std::memory_order_relaxed); }
+  std::uint64_t change_count() const { return change_count_.load(std::memory_order_relaxed); }
 
  private:
   void Publish() { log_enabled_ = values_.count(kLogOption) && values_[kLogOption] != 0; }
@@ -49,6 +51,7 @@ class Database {
   std::mutex mutex_;
   std::map<std::string, int> values_;  // guarded by mutex_
   std::atomic<bool> log_enabled_{false};
+  std::atomic<std::uint64_t> change_count_{1};
 };
 
 Database& database() {
@@ -77,11 +80,11 @@ void Write(const std::string& text) {
 
 }  // namespace
 
-bool DebugDatabase::GetBool(const std::string& name) {
-  return database().Get(name) != 0;
+bool DebugDatabase::GetBool(const std::string& name, bool unless_set) {
+  return database().Get(name, unless_set) != 0;
 }
 int DebugDatabase::GetInt(const std::string& name) {
-  return database().Get(name);
+  return database().Get(name, 0);
 }
 void DebugDatabase::Set(const std::string& name, int value) {
   database().Set(name, value);
@@ -114,7 +117,11 @@ void Log(const char* format, ...) {
 }
 
 bool TraceEnabled(const std::string& channel, int level) {
-  return database().Get("Trace." + channel) >= level;
+  return database().Get("Trace." + channel, 0) >= level;
+}
+
+std::uint64_t TraceChangeCount() {
+  return database().change_count();
 }
 
 void Trace(const std::string& channel, int level, const std::string& text) {

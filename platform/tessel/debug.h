@@ -2,6 +2,7 @@
 
 #include <boost/function.hpp>
 #include <chrono>
+#include <cstdint>
 #include <string>
 
 // Debug options, the solve's log, trace channels and timing entries. Everything here may be called
@@ -13,7 +14,7 @@ namespace tessel::debug {
 // without "=" means 1).
 class DebugDatabase {
  public:
-  static bool GetBool(const std::string& name);
+  static bool GetBool(const std::string& name, bool unless_set = false);
   static int GetInt(const std::string& name);
   static void Set(const std::string& name, int value);
 };
@@ -31,6 +32,8 @@ void Log(const char* format, ...);
 
 // A channel is enabled at a level when the option "Trace.<channel>" is at least that level.
 bool TraceEnabled(const std::string& channel, int level);
+// Moves whenever TraceEnabled may answer otherwise than before. One load.
+std::uint64_t TraceChangeCount();
 // Writes "<thread id> <channel> <level> text" and a newline if the channel is enabled at the level.
 void Trace(const std::string& channel, int level, const std::string& text);
 

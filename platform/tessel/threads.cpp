@@ -6,6 +6,8 @@
 
 #include <thread>
 
+#include "platform/tessel/threads_internal.h"
+
 namespace tessel::threads {
 
 void ExecuteCPUBoundTaskOnAllProcessors(const boost::function<void(std::size_t)>& task,
@@ -33,13 +35,50 @@ ProcessorLimit::~ProcessorLimit() = default;
 
 namespace {
 
+// Threads that may run tasks, for Shutdown to wait for.
+class LiveThreads {
+ public:
+  void Begin() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    ++count_;
+  }
+  void End() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    if (--count_ == 0) none_left_.notify_all();
+  }
+  void WaitForNone() {
+    std::unique_lock<std::mutex> lock(mutex_);
+    none_left_.wait(lock, [this] { return count_ == 0; });
+  }
+
+ private:
+  std::mutex mutex_;
+  std::condition_variable none_left_;
+  int count_ = 0;  // guarded by mutex_
+};
+
+LiveThreads& live_threads() {
+  static LiveThreads& threads = *new LiveThreads;  // outlives detached threads
+  return threads;
+}
+
 // A thread a task. A solve runs for minutes and may wait for a frame or a lock of its host: on the
 // pool of the parallel loops it would hold a worker that renders need, and two solves on a
 // one-processor machine would queue.
 class ThreadPerTask final : public Executor {
  public:
   void Post(boost::function<void()> task) override {
-    std::thread([task = std::move(task)] { task(); }).detach();
+    live_threads().Begin();
+    try {
+      std::thread([task = std::move(task)]() mutable {
+        task();
+        task.clear();  // what it holds must be gone before Shutdown returns
+        live_threads().End();
+      }).detach();
+    } catch (...) {
+      live_threads().End();
+      throw;
+    }
   }
 };
 
@@ -48,6 +87,41 @@ class ThreadPerTask final : public Executor {
 Executor& GetCPUBoundExecutor() {
   static ThreadPerTask& executor = *new ThreadPerTask;  // outlives detached threads
   return executor;
+}
+
+void Shutdown() {
+  static std::mutex& one_at_a_time = *new std::mutex;
+  std::lock_guard<std::mutex> lock(one_at_a_time);
+  internal::BeginEndingPooledThreads();
+  live_threads().WaitForNone();
+  internal::FinishEndingPooledThreads();
+}
+
+namespace internal {
+void BeginThread() {
+  live_threads().Begin();
+}
+void EndThread() {
+  live_threads().End();
+}
+}  // namespace internal
+
+void Gate::Open() {
+  std::lock_guard<std::mutex> lock(mutex_);
+  open_ = true;
+  ++openings_;
+  opened_.notify_all();
+}
+
+void Gate::Close() {
+  std::lock_guard<std::mutex> lock(mutex_);
+  open_ = false;
+}
+
+void Gate::Wait() {
+  std::unique_lock<std::mutex> lock(mutex_);
+  const std::uint64_t openings = openings_;
+  opened_.wait(lock, [&] { return open_ || openings_ != openings; });
 }
 
 void CompletionEvent::Signal() {

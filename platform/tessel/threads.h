@@ -5,6 +5,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <mutex>
 
@@ -39,8 +40,58 @@ class Executor {
 };
 
 // The process's executor for long computations. Tasks may run at the same time as each other; none
-// waits for another to end. Lives until the process ends, which waits for no task.
+// waits for another to end. Lives until the process ends, which waits for no task unless Shutdown
+// is called.
 Executor& GetCPUBoundExecutor();
+
+// A queue of tasks with a thread of its own: tasks run one at a time, in the order of the times at
+// which they fall due, and those of one time in the order of posting. A task that lets an exception
+// out ends the program. Every operation may be called from any thread, the executor's own too, and
+// none but WaitPoint waits. The order of the operations is part of the interface.
+class SingleThreadedExecutor {
+ public:
+  virtual ~SingleThreadedExecutor() = default;
+  // The task falls due `delay_ms` milliseconds from now. False, and the task is dropped, once the
+  // queue has ended or the executor was given back.
+  virtual bool Post(boost::function<void()> task, std::uint32_t delay_ms) = 0;
+  // No new task begins and WaitPoint blocks, until Resume. Not counted.
+  virtual void Pause() = 0;
+  virtual void Resume() = 0;
+  // For a task to call now and then: blocks while the executor is paused.
+  virtual void WaitPoint() = 0;
+  virtual bool IsOwnThread() const = 0;
+  // Lifts a pause for good. Tasks that were posted still run, delayed ones at once; no new ones.
+  virtual void EndQueue() = 0;
+};
+
+using SingleThreadedExecutorPtr = boost::shared_ptr<SingleThreadedExecutor>;
+
+// An executor on a pooled thread that is nobody else's until it was given back and its tasks, the
+// delayed ones at their times, have run.
+SingleThreadedExecutorPtr BorrowTemporarySingleThreadedExecutor();
+// Waits for nothing, so that an executor's own task may call it. Lifts a pause for good.
+void ReturnTemporarySingleThreadedExecutor(const SingleThreadedExecutorPtr& executor);
+
+// Ends the queues of all single-threaded executors, borrowed ones too, and waits until every
+// background task has run and been destroyed and the pooled threads have ended. For a host before
+// it unloads a plug-in, whose tasks they may be; tasks that wait for the caller must be cancelled
+// first. Not to be called from a task. Executors may be asked for again afterwards.
+void Shutdown();
+
+// Manual-reset gate for any number of waiters; closed at first. A waiter that Open finds waiting
+// gets through, though the gate may be closed again before it runs.
+class Gate {
+ public:
+  void Open();
+  void Close();
+  void Wait();
+
+ private:
+  std::mutex mutex_;
+  std::condition_variable opened_;
+  bool open_ = false;           // guarded by mutex_
+  std::uint64_t openings_ = 0;  // guarded by mutex_
+};
 
 // Manual-reset event: once signalled, every wait returns at once, for good.
 class CompletionEvent {
