@@ -60,9 +60,18 @@ TEST_F(EffectGlobalsTest, StartTellsTheHostWhatTheEffectIs) {
   EXPECT_STREQ(GetString(Context(), 3), "");  // the end mark
   EXPECT_STREQ(GetString(Context(), -1), "");
   EXPECT_EQ(Stop(), 0);
-  EXPECT_FALSE(host_.out.global_data);
-  EXPECT_FALSE(host_.in.global_data);
   EXPECT_EQ(Stop(), 0);
+}
+
+TEST_F(EffectGlobalsTest, TheHandleStandsInBothRecordsAndGoesFromBoth) {
+  host_.out.out_flags = 0x20000000;  // the words are added to what is there
+  OpenPlugin(Context(), strings);
+  EXPECT_TRUE(host_.in.global_data);
+  EXPECT_EQ(host_.out.global_data, host_.in.global_data);
+  EXPECT_EQ(host_.out.out_flags, 0x20001216u);
+  ClosePlugin(Context());
+  EXPECT_FALSE(host_.in.global_data);
+  EXPECT_FALSE(host_.out.global_data);
 }
 
 TEST_F(EffectGlobalsTest, AStartThatFailsLeavesNothing) {
