@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include "stabilizer/effect/src/analysis_parameter_rules.h"
+
 namespace kelp::effect {
 namespace {
 
@@ -38,8 +40,8 @@ TEST(ParameterRulesTest, WindowsGrowWithTheHeight) {
   } cases[] = {{300, 7}, {480, 7},  {554, 7},   {555, 8},   {576, 8},  {600, 8},
                {630, 9}, {720, 10}, {1079, 14}, {1080, 15}, {2000, 15}};
   for (const auto& c : cases) {
-    EXPECT_EQ(WindowRule(c.height, false), c.half) << c.height;
-    EXPECT_EQ(WindowRule(c.height, true), c.half + 5) << c.height;
+    EXPECT_EQ(analysis::effect::WindowRule(c.height, false), c.half) << c.height;
+    EXPECT_EQ(analysis::effect::WindowRule(c.height, true), c.half + 5) << c.height;
   }
 }
 
