@@ -100,6 +100,18 @@ TEST(ParameterRulesTest, AnamorphicClipsAreSolvedInSquarePixels) {
   clip.pixel_aspect_num = 1;
   clip.pixel_aspect_den = 10000;
   EXPECT_EQ(clip.square_width(), 1u);
+  const struct {
+    std::uint32_t width;
+    std::int64_t num, den;
+    std::uint32_t square;
+  } cases[] = {{1440, 4, 3, 1920}, {720, 16, 15, 768}, {720, 10, 11, 655},
+               {720, 0, 1, 1},     {720, 0, 0, 1},     {720, 1, 0, UINT32_MAX}};
+  for (const auto& c : cases) {
+    clip.width = c.width;
+    clip.pixel_aspect_num = c.num;
+    clip.pixel_aspect_den = c.den;
+    EXPECT_EQ(clip.square_width(), c.square) << c.num << ':' << c.den;
+  }
 }
 
 TEST(ParameterRulesTest, ControlsStartAtTheTablesDefaults) {

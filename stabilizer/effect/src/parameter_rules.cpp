@@ -16,7 +16,8 @@ std::uint32_t ClipGeometry::square_width() const {
       std::floor(static_cast<double>(width) * static_cast<double>(pixel_aspect_num) /
                      static_cast<double>(pixel_aspect_den) +
                  0.5);
-  return static_cast<std::uint32_t>(std::max(square, 1.0));
+  if (!(square >= 1.0)) return 1;  // also a ratio of 0 : 0
+  return static_cast<std::uint32_t>(std::min(square, 4294967295.0));
 }
 
 float ClipGeometry::pixel_aspect() const {
