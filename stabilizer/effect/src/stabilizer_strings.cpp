@@ -5,8 +5,7 @@
 namespace kelp::effect {
 namespace {
 
-// Popups' items and group names are shown in the host's panel; names of parameters have room for 31
-// bytes.
+// Those that name a parameter have room for 31 bytes.
 constexpr const char* kLiterals[] = {
     "$$$/OV/Stabilizer/LStr/0000=Calmframe, v%d.%d#{cr}#{cr}Stabilizes footage without manual "
     "tracking.",
