@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cmath>
 
+#include "stabilizer/effect/src/analysis_parameter_rules.h"
+
 namespace kelp::effect {
 
 using marrow::stabilization::SolverParamsRecord;
@@ -14,72 +16,114 @@ std::uint32_t ClipGeometry::square_width() const {
       std::floor(static_cast<double>(width) * static_cast<double>(pixel_aspect_num) /
                      static_cast<double>(pixel_aspect_den) +
                  0.5);
-  return static_cast<std::uint32_t>(std::max(square, 1.0));
+  if (!(square >= 1.0)) return 1;  // also a ratio of 0 : 0
+  return static_cast<std::uint32_t>(std::min(square, 4294967295.0));
 }
 
 float ClipGeometry::pixel_aspect() const {
   return static_cast<float>(static_cast<double>(square_width()) / static_cast<double>(width));
 }
 
-std::uint64_t WindowRule(std::uint32_t height, bool detailed) {
-  const double clamped = std::clamp(static_cast<double>(height), 480.0, 1080.0);
-  return static_cast<std::uint64_t>((clamped - 480.0) / 600.0 * 8.0 + 7.0) + (detailed ? 5 : 0);
-}
-
-SelectorParams MakeSelectorParams(const Controls& controls, const ClipGeometry& clip) {
-  SelectorParams params;
-  params.max_count = controls.detailed_analysis ? 2000 : 500;
-  const double area_a_feature = static_cast<double>(clip.width) * static_cast<double>(clip.height) /
-                                (5.0 * static_cast<double>(params.max_count));
-  params.spacing =
-      std::max<std::uint64_t>(4, static_cast<std::uint64_t>(std::sqrt(area_a_feature) + 0.5));
-  params.half_winx = params.half_winy = WindowRule(clip.height, controls.detailed_analysis);
-  params.threshold = 0.01f;
-  return params;
-}
-
-TrackerParams MakeTrackerParams(const Controls& controls, const ClipGeometry& clip) {
-  TrackerParams params;
-  params.half_win_x = params.half_win_y = WindowRule(clip.height, controls.detailed_analysis);
-  params.tolerance_min_correlation = controls.detailed_analysis ? 0.5 : 0.7;
-  params.kill_tracks_shorter_than = 5;
-  return params;
-}
-
-SolverParamsRecord MakeSolverParams(const Controls& controls, const ClipGeometry& clip) {
-  SolverParamsRecord params;
-  const bool enhanced = controls.rolling_shutter_ripple == RollingShutterRipple::enhanced_reduction;
+SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeometry& clip) {
+  const auto real = [&params](std::int32_t index) {
+    return static_cast<float>(params.GetFloatParam(index));
+  };
+  const bool enhanced = params.GetPopupParam(kRollingShutterRippleIndex) ==
+                        static_cast<int>(RollingShutterRipple::enhanced_reduction);
+  const auto framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
   const double larger_side = std::max(clip.square_width(), clip.height);
+  SolverParamsRecord record;
 
-  params.smoothness_lambda = 4.0 * controls.smoothness;
-  params.transition_stab_lambda = params.smoothness_lambda * 0.5;
-  params.conservative_threshold = enhanced ? 2.5 : 7.5;
-  params.homography_limit = enhanced ? 100.0f : 50.0f;
-  params.reconstruction_error_threshold =
-      params._reconstruction_error_threshold_ratio * larger_side;
-  params.reconstruction_error_third = params.reconstruction_error_threshold / 3.0;
-  params.no_motion = controls.result == Result::no_motion;
-  constexpr double kWarpFactor = 10.0;  // the hidden control's default: the plain method
-  params.method_level =
-      static_cast<float>(static_cast<int>(controls.method) - (1.0 - kWarpFactor / 10.0));
-  params.pixel_aspect = clip.pixel_aspect();
+  record.rank = params.GetIntParam(kRankIndex);
+  record.duration = params.GetIntParam(kWindowDurationIndex);
+  record.step = params.GetIntParam(kWindowStepIndex);
+  record.min_duration = params.GetIntParam(kMinDurationIndex);
+  record.kernel_size = params.GetIntParam(kKernelSizeIndex);
+  record.short_trajectory_duration = params.GetIntParam(kShortTrajectoryDurationIndex);
+  record.track_fade_duration = params.GetIntParam(kTrackFadeDurationIndex);
+  record.track_fade_minimum = params.GetIntParam(kTrackFadeMinimumIndex);
+  record.smoothness_lambda = 4.0 * params.GetFloatParam(kSmoothnessIndex);
+  record.conservative_factorization = params.GetBoolParam(kConservativeFactorizationIndex);
+  record.conservative_threshold = params.GetFloatParam(kConservativeThresholdIndex);
+  if (record.conservative_threshold == 0) record.conservative_threshold = enhanced ? 2.5 : 7.5;
+  record._reconstruction_error_threshold_ratio = params.GetFloatParam(kMaxReprojectionErrorIndex);
+  record.reconstruction_error_threshold =
+      record._reconstruction_error_threshold_ratio * larger_side;
+  record.reconstruction_error_third = record.reconstruction_error_threshold / 3.0;
+  record.max_factorization_frames = params.GetIntParam(kMaxFactorizationFramesIndex);
+  record.factorization_window_overlap = params.GetIntParam(kFactorizationWindowOverlapIndex);
 
-  params.crop = crops(controls.framing);
-  params.action_safe_margin = static_cast<float>(controls.action_safe_margin / 100.0);
-  params.maximum_scale = controls.framing == Framing::crop_auto_scale
-                             ? static_cast<float>(controls.maximum_scale / 100.0)
+  record.max_transition_iterations = params.GetIntParam(kMaxTransitionIterationsIndex);
+  record.transition_window_overlap = params.GetIntParam(kTransitionWindowOverlapIndex);
+  record.transition_bisquare_sigma = params.GetFloatParam(kTransitionBisquareSigmaIndex);
+  record.use_new_solver = params.GetBoolParam(kUseNewSolverIndex);
+  record.transition_max_duration = params.GetIntParam(kTransitionMaxDurationIndex);
+  record.transition_stab_lambda = params.GetFloatParam(kTransitionStabLambdaIndex);
+  if (record.transition_stab_lambda == 0) {
+    record.transition_stab_lambda = record.smoothness_lambda * 0.5;
+  }
+  record.transition_fade_duration = params.GetIntParam(kTransitionFadeDurationIndex);
+
+  record.no_motion = params.GetPopupParam(kResultIndex) == static_cast<int>(Result::no_motion);
+  record.homography_limit = real(kHomographyLimitIndex);
+  if (record.homography_limit == 0) record.homography_limit = enhanced ? 100.0f : 50.0f;
+  record.method_level = static_cast<float>(params.GetPopupParam(kMethodIndex) -
+                                           (1.0 - params.GetFloatParam(kWarpFactorIndex) / 10.0));
+  record.pixel_aspect = clip.pixel_aspect();
+
+  record.crop = crops(framing);
+  record.action_safe_margin =
+      static_cast<float>(params.GetFloatParam(kActionSafeMarginIndex) / 100.0);
+  record.maximum_scale = framing == Framing::crop_auto_scale
+                             ? static_cast<float>(params.GetFloatParam(kMaximumScaleIndex) / 100.0)
                              : 1.0f;
 
   // At half way or less the crop path follows two seconds of frames; towards 1 nearly twenty; at 1
   // the window stands still.
-  const double more = controls.crop_less_smooth_more / 100.0;
-  const double reach = std::min(2.0 * more, 1.0);
-  params.path_bilateral_sigma = static_cast<float>(std::max(reach * reach * larger_side, 1.0));
-  params.path_gaussian_sigma =
-      more == 1.0 ? 1000000.0f
-                  : static_cast<float>(((std::clamp(more, 0.5, 1.0) - 0.5) * 2.0 * 18.0 + 2.0) *
-                                       clip.frame_rate);
-  return params;
+  const double more = params.GetFloatParam(kCropLessSmoothMoreIndex) / 100.0;
+  record.path_bilateral_sigma = real(kPathBilateralSigmaIndex);
+  if (record.path_bilateral_sigma == 0) {
+    const double reach = std::min(2.0 * more, 1.0);
+    record.path_bilateral_sigma = static_cast<float>(std::max(reach * reach * larger_side, 1.0));
+  }
+  record.path_gaussian_sigma = real(kPathGaussianSigmaIndex);
+  if (record.path_gaussian_sigma == 0) {
+    record.path_gaussian_sigma =
+        more == 1.0 ? 1000000.0f
+                    : static_cast<float>(((std::clamp(more, 0.5, 1.0) - 0.5) * 2.0 * 18.0 + 2.0) *
+                                         clip.frame_rate);
+  }
+  return record;
+}
+
+ParameterValues ValuesOf(const Controls& controls) {
+  ParameterValues values;
+  values[kResultIndex] = static_cast<int>(controls.result);
+  values[kSmoothnessIndex] = controls.smoothness;
+  values[kMethodIndex] = static_cast<int>(controls.method);
+  values[kFramingIndex] = static_cast<int>(controls.framing);
+  values[kMaximumScaleIndex] = controls.maximum_scale;
+  values[kActionSafeMarginIndex] = controls.action_safe_margin;
+  values[kAdditionalScaleIndex] = controls.additional_scale;
+  values[kDetailedAnalysisIndex] = controls.detailed_analysis;
+  values[kRollingShutterRippleIndex] = static_cast<int>(controls.rolling_shutter_ripple);
+  values[kCropLessSmoothMoreIndex] = controls.crop_less_smooth_more;
+  return values;
+}
+
+SelectorParams MakeSelectorParams(const Controls& controls, const ClipGeometry& clip) {
+  const ParameterValues values = ValuesOf(controls);
+  return analysis::effect::GetSelectorParams(TableReader(values, false), clip.width, clip.height);
+}
+
+TrackerParams MakeTrackerParams(const Controls& controls, const ClipGeometry& clip) {
+  const ParameterValues values = ValuesOf(controls);
+  return analysis::effect::GetTrackerParams(TableReader(values, false), clip.height);
+}
+
+SolverParamsRecord MakeSolverParams(const Controls& controls, const ClipGeometry& clip) {
+  const ParameterValues values = ValuesOf(controls);
+  return GetSolverParams(TableReader(values, false), clip);
 }
 
 }  // namespace kelp::effect

@@ -3,18 +3,14 @@
 #include <cstdint>
 
 #include "stabilization/solver_params.h"
+#include "stabilizer/effect/src/table_reader.h"
 #include "stabilizer/render/frame_renderer.h"
 #include "tracking/selector_params.h"
 #include "tracking/tracker_params.h"
 
-// How the controls become the three parameter records: defaults of the hidden controls, values
-// found from the frame's size where a control says 0 = auto, and the solve's numbers from the few
-// controls that a person sees.
+// How parameters become the record of a solve, and how the few controls that a person sees become
+// parameters.
 namespace kelp::effect {
-
-enum class Result { smooth_motion = 1, no_motion = 2 };
-enum class Method { position = 1, position_scale_rotation = 2, perspective = 3, subspace_warp = 4 };
-enum class RollingShutterRipple { automatic_reduction = 1, enhanced_reduction = 2 };
 
 // The controls that a person sees, with their defaults. Percentages as shown: 50 is 50 %.
 struct Controls {
@@ -44,11 +40,13 @@ struct ClipGeometry {
   float pixel_aspect() const;
 };
 
-// Half side of a window: 7 at 480 lines or less, 15 at 1080 or more, linear between and truncated;
-// 5 more when detailed.
-std::uint64_t WindowRule(std::uint32_t height, bool detailed);
+marrow::stabilization::SolverParamsRecord GetSolverParams(const ParameterReader& params,
+                                                          const ClipGeometry& clip);
 
-// The records of the hidden controls' defaults with every automatic value filled in.
+// All parameters with the controls' values, the others at their defaults.
+ParameterValues ValuesOf(const Controls& controls);
+
+// The records of the controls.
 marrow::tracking::SelectorParams MakeSelectorParams(const Controls& controls,
                                                     const ClipGeometry& clip);
 marrow::tracking::TrackerParams MakeTrackerParams(const Controls& controls,

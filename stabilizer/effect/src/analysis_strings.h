@@ -1,0 +1,17 @@
+#pragma once
+
+#include <cstdint>
+
+// Texts for the user of any effect that analyses its input first: keyed literals, for
+// tessel::config::Localizer.
+namespace kelp::analysis::effect {
+
+// What a frame's status is called where an effect has no wording of its own; null for a status
+// without a text.
+const char* AnalysisStatusLiteral(std::int32_t status);
+
+// On the Cancel button until the job has started.
+inline constexpr char kCancelButtonInitializing[] =
+    "$$$/kelp/analysis/parameter/name/CancelButtonInitializing=Initializing...";
+
+}  // namespace kelp::analysis::effect

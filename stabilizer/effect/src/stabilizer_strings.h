@@ -1,0 +1,64 @@
+#pragma once
+
+#include <cstdint>
+
+#include "platform/hx/hx_effect.h"
+
+// The stabilizer's texts for the user. All are keyed literals, which the host's string table or
+// tessel::config::Localizer turns into plain text.
+namespace kelp::effect {
+
+// Entries of the numbered table.
+enum StringNumber : std::int32_t {
+  kStringAbout = 0,  // %d.%d: version
+  kStringOutOfMemory = 2,
+  kStringFinished = 5,
+  kStringFrameProgress = 6,  // %d %% (frame %d%s of %d)
+  kStringCanceled = 7,
+  kStringMinutesLeft = 8,
+  kStringSecondsLeft = 9,
+  kStringStabilization = 12,
+  kStringResult = 13,
+  kStringResultItems = 14,
+  kStringSmoothness = 15,
+  kStringMethod = 16,
+  kStringMethodItems = 17,
+  kStringBorders = 18,
+  kStringFraming = 19,
+  kStringFramingItems = 20,
+  kStringAutoScale = 21,
+  kStringMaximumScale = 22,
+  kStringActionSafeMargin = 23,
+  kStringAdditionalScale = 24,
+  kStringAdvanced = 25,
+  kStringRollingShutterRipple = 27,
+  kStringRollingShutterRippleItems = 28,
+  kStringCropLessSmoothMore = 29,
+  kStringSynthesisInputRange = 30,
+  kStringSynthesisEdgeFeather = 31,
+  kStringSynthesisEdgeCropping = 32,
+  kStringLeft = 33,
+  kStringTop = 34,
+  kStringRight = 35,
+  kStringBottom = 36,
+  kStringHideWarningBanner = 37,
+  kStringMinuteLeft = 38
+};
+
+// Table 4700, for HX_Callbacks.open_strings. Static.
+const HX_StringTable& StabilizerStringTable();
+
+// The stabilizer's own wording of a frame's status; null where it has none and the analysis'
+// wording counts.
+const char* StabilizerStatusLiteral(std::int32_t status);
+
+// @0: the present scale in percent.
+inline constexpr char kAutoScaleReadout[] =
+    "$$$/Plugin/Stabilizer/AutoScaleReadout=Auto-scale (@0%)";
+// @0: the frame.
+inline constexpr char kOutOfMemoryError[] =
+    "$$$/OV/Stabilizer/OutOfMemoryError=Calmframe out of memory on frame @0.";
+inline constexpr char kGenericError[] =
+    "$$$/OV/Stabilizer/GenericError=unknown exception on frame @0 in Calmframe.";
+
+}  // namespace kelp::effect
