@@ -1,0 +1,1 @@
+#include "analysis/src/rational_time.h"
