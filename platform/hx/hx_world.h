@@ -11,8 +11,9 @@
   UINT32_C(0x62677261) /* "argb", HX_Pixel8; in memory alpha, red, green, blue */
 #define HX_FORMAT_ARGB16 UINT32_C(0x36677261) /* "arg6", HX_Pixel16 */
 #define HX_FORMAT_ARGBF UINT32_C(0x66677261)  /* "argf", HX_PixelFloat */
-#define HX_FORMAT_BGRA8 UINT32_C(0x61726762)  /* "bgra", 8 bit; in memory blue, green, red, alpha \
-                                               */
+#define HX_FORMAT_BGRA8                                                    \
+  UINT32_C(0x61726762) /* "bgra", 8 bit; in memory blue, green, red, alpha \
+                        */
 /* Set in the format of a delivered frame whose first row in memory is the top one; else it is the
  * bottom one. */
 #define HX_FORMAT_TOP_DOWN UINT32_C(0x80000000)

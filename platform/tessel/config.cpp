@@ -1,5 +1,7 @@
 #include "platform/tessel/config.h"
 
+#include <algorithm>
+#include <boost/algorithm/string/replace.hpp>
 #include <mutex>
 #include <shared_mutex>
 #include <utility>
@@ -27,20 +29,8 @@ Table& table() {
 
 std::string Resolve(std::string text) {
   text.erase(std::min(text.find(kComment), text.size()));
-  std::string result;
-  for (std::size_t i = 0; i < text.size();) {
-    bool replaced = false;
-    for (const auto& [entity, value] : kEntities) {
-      const std::string name = entity;
-      if (text.compare(i, name.size(), name) != 0) continue;
-      result += value;
-      i += name.size();
-      replaced = true;
-      break;
-    }
-    if (!replaced) result += text[i++];
-  }
-  return result;
+  for (const auto& [entity, value] : kEntities) boost::replace_all(text, entity, value);
+  return text;
 }
 
 }  // namespace

@@ -44,5 +44,17 @@ TEST_F(DebugTest, TraceLevelsAndTimingEntries) {
                            "\\[[0-9:.]+ elapsed\\]\n"));
 }
 
+TEST_F(DebugTest, OptionsHaveDefaultsAndChangesAreCounted) {
+  EXPECT_TRUE(DebugDatabase::GetBool("NeverSet", true));
+  EXPECT_FALSE(DebugDatabase::GetBool("NeverSet"));
+  const std::uint64_t before = TraceChangeCount();
+  EXPECT_EQ(TraceChangeCount(), before);
+  DebugDatabase::Set("Trace.Subspace Stabilizer", 6);
+  EXPECT_NE(TraceChangeCount(), before);
+  EXPECT_TRUE(TraceEnabled("Subspace Stabilizer", 6));
+  DebugDatabase::Set("Off", 0);
+  EXPECT_FALSE(DebugDatabase::GetBool("Off", true));
+}
+
 }  // namespace
 }  // namespace tessel::debug

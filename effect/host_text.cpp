@@ -1,0 +1,69 @@
+#include "effect/host_text.h"
+
+#include <vector>
+
+#include "effect/effect_globals.h"
+#include "effect/suite.h"
+#include "platform/tessel/config.h"
+#include "platform/tessel/utility.h"
+
+namespace kelp::effect {
+namespace {
+
+constexpr char kOutOfMemory[] =
+    "$$$/OV/Stabilizer/OutOfMemoryError=Calmframe out of memory on frame @0.";
+constexpr char kGenericError[] =
+    "$$$/OV/Stabilizer/GenericError=unknown exception on frame @0 in Calmframe.";
+
+constexpr std::int32_t kAboutString = 0;
+constexpr int kMajorVersion = 1;
+constexpr int kMinorVersion = 0;
+constexpr std::size_t kFormatSize = 512;  // bound of HX_Callbacks.format
+
+void ReportOnFrame(const HostContext& context, const char* literal, std::int64_t frame) noexcept {
+  try {
+    const std::string text = tessel::utility::ReplaceInString(
+        tessel::config::Localizer::Localize(literal), tessel::utility::NumberToString(frame));
+    ConvertToHostText(context, text, context.out->return_msg, HX_RETURN_MSG_SIZE);
+    context.out->out_flags |= HX_OUT_FLAG_SHOW_MESSAGE;
+  } catch (...) {
+  }
+}
+
+}  // namespace
+
+void ShowMessage(const HostContext& context, const char* text) {
+  context.out->out_flags |= HX_OUT_FLAG_SHOW_MESSAGE;
+  context.in->cb->copy_text(context.out->return_msg, HX_RETURN_MSG_SIZE, text);
+}
+
+void ConvertToHostText(const HostContext& context, const std::string& text, char* to,
+                       std::uint32_t size) {
+  const std::u16string wide = tessel::utility::ToUTF16(text);
+  std::vector<std::uint16_t> units(wide.begin(), wide.end());
+  units.push_back(0);
+  const ScopedSuite<HX_PrivateEffectSuite3> suite(context);
+  ThrowIfFailed(suite->ConvertText(units.data(), to, size));
+}
+
+const char* GetString(const HostContext& context, std::int32_t index) {
+  const std::uint64_t token = GlobalsLock(context)->string_token;
+  const char* text = context.in->cb->get_string(token, index, 0, 0);
+  return text ? text : "";
+}
+
+void ShowAboutText(const HostContext& context) {
+  char text[kFormatSize];
+  context.in->cb->format(text, GetString(context, kAboutString), kMajorVersion, kMinorVersion);
+  context.in->cb->copy_text(context.out->return_msg, HX_RETURN_MSG_SIZE, text);
+}
+
+void ReportOutOfMemoryOnFrame(const HostContext& context, std::int64_t frame) noexcept {
+  ReportOnFrame(context, kOutOfMemory, frame);
+}
+
+void ReportUnknownExceptionOnFrame(const HostContext& context, std::int64_t frame) noexcept {
+  ReportOnFrame(context, kGenericError, frame);
+}
+
+}  // namespace kelp::effect

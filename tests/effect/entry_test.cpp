@@ -1,0 +1,277 @@
+#include "effect/entry.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <functional>
+#include <map>
+#include <new>
+#include <set>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "platform/tessel/config.h"
+#include "tests/effect/fake_host.h"
+
+namespace kelp::effect {
+namespace {
+
+using testing::ElementsAre;
+
+// What the effects of a case did and shall do.
+struct Script {
+  std::vector<std::string> calls;
+  HostContext seen{};
+  std::function<void()> operation = [] {};
+  std::function<void()> report = [] {};
+  HX_Err add_param_code = HX_ERR_NONE;  // answered for index 3
+};
+Script script;
+
+class ProbeEffect final : public GenericEffect {
+ public:
+  explicit ProbeEffect(const HostContext& context) noexcept : GenericEffect(context) {}
+
+  void ShowAbout() override { Run("ShowAbout"); }
+  void PrepareFrame() override { Run("PrepareFrame"); }
+  void StartPlugin() override { Run("StartPlugin"); }
+  void DeclareParams() override {
+    Run("DeclareParams");
+    DeclareParamCount(5);
+  }
+  void StopPlugin() override { Run("StopPlugin"); }
+  void CreateInstance() override { Run("CreateInstance"); }
+  void RestoreInstance() override { Run("RestoreInstance"); }
+  void FlattenInstance() override { Run("FlattenInstance"); }
+  void OpenOptions() override { Run("OpenOptions"); }
+  void ParamChanged() override { Run("ParamChanged"); }
+  void RefreshParams() override { Run("RefreshParams"); }
+  void DestroyInstance() override { Run("DestroyInstance"); }
+  void IdleTick() override { Run("IdleTick"); }
+  void RenderFrame() override { Run("RenderFrame"); }
+  void PlanFrame() override { Run("PlanFrame"); }
+  void RenderPlannedFrame() override { Run("RenderPlannedFrame"); }
+  void CustomDataOp() override { Run("CustomDataOp"); }
+  void Event0() override { Run("0"); }
+  void Event1() override { Run("1"); }
+  void Event2() override { Run("2"); }
+  void Event3() override { Run("3"); }
+  void Event4() override { Run("4"); }
+  void Event5() override { Run("5"); }
+  void Event6() override { Run("6"); }
+  void Event7() override { Run("7"); }
+  void Event9() override { Run("9"); }
+  void Event10() override { Run("10"); }
+  void Event11() override { Run("11"); }
+  void ReportOutOfMemory() override {
+    script.calls.push_back("out of memory");
+    script.report();
+  }
+  void ReportUnknownException() override {
+    script.calls.push_back("unknown exception");
+    script.report();
+  }
+  HX_Err AddParam(std::int32_t index) override {
+    script.calls.push_back("AddParam " + std::to_string(index));
+    return index == 3 ? script.add_param_code : HX_ERR_NONE;
+  }
+
+ private:
+  void Run(const char* name) {
+    script.calls.push_back(name);
+    script.seen = context();
+    script.operation();
+  }
+};
+
+// With the operations that every effect has from its base.
+class BareEffect final : public GenericEffect {
+ public:
+  explicit BareEffect(const HostContext& context) noexcept : GenericEffect(context) {}
+  void ReportOutOfMemory() override {}
+  void ReportUnknownException() override {}
+  HX_Err AddParam(std::int32_t) override { return HX_ERR_UNKNOWN; }
+};
+
+const std::map<std::uint32_t, std::string> kOperations = {
+    {0, "ShowAbout"},           {1, "StartPlugin"},
+    {3, "StopPlugin"},          {4, "DeclareParams"},
+    {5, "CreateInstance"},      {6, "RestoreInstance"},
+    {7, "FlattenInstance"},     {8, "DestroyInstance"},
+    {9, "OpenOptions"},         {10, "PrepareFrame"},
+    {11, "RenderFrame"},        {13, "ParamChanged"},
+    {14, "RefreshParams"},      {15, "0"},  // of the event below
+    {22, "CustomDataOp"},       {23, "PlanFrame"},
+    {24, "RenderPlannedFrame"}, {27, "IdleTick"}};
+
+class EntryTest : public testing::Test {
+ protected:
+  EntryTest() { script = {}; }
+
+  HX_Err Run(std::uint32_t command) {
+    script.calls.clear();
+    return EffectMain<ProbeEffect>(command, &in_, &out_, params_, &output_, &event_);
+  }
+
+  HX_InData in_{};
+  HX_OutData out_{};
+  HX_ParamDef* params_[1] = {};
+  HX_World output_{};
+  HX_EventExtra event_{};
+};
+
+TEST_F(EntryTest, EachCommandReachesItsOperationWithTheSixArguments) {
+  for (const auto& [command, operation] : kOperations) {
+    EXPECT_EQ(Run(command), 0);
+    ASSERT_FALSE(script.calls.empty()) << command;
+    EXPECT_EQ(script.calls.front(), operation);
+    EXPECT_EQ(script.seen.command, command);
+    EXPECT_EQ(script.seen.in, &in_);
+    EXPECT_EQ(script.seen.out, &out_);
+    EXPECT_EQ(script.seen.params, params_);
+    EXPECT_EQ(script.seen.output, &output_);
+    EXPECT_EQ(script.seen.extra, &event_);
+  }
+}
+
+TEST_F(EntryTest, OtherCommandsTouchNothing) {
+  std::set<std::uint32_t> others = {1000, 0x10000, 0x80000000U, 0xffffffffU};
+  for (std::uint32_t command = 0; command <= 200; ++command) {
+    if (!kOperations.count(command)) others.insert(command);
+  }
+  std::memset(&out_, 0x5a, sizeof(out_));
+  const HX_OutData before = out_;
+  for (const std::uint32_t command : others) {
+    EXPECT_EQ(Run(command), 0) << command;
+    EXPECT_TRUE(script.calls.empty()) << command;
+    EXPECT_EQ(std::memcmp(&out_, &before, sizeof(out_)), 0) << command;
+    EXPECT_EQ(EffectMain<ProbeEffect>(command, nullptr, nullptr, nullptr, nullptr, nullptr), 0);
+  }
+  for (const auto& [command, operation] : kOperations) {
+    EXPECT_EQ(EffectMain<BareEffect>(command, nullptr, nullptr, nullptr, nullptr, nullptr), 0);
+  }
+}
+
+TEST_F(EntryTest, EventsReachTheOperationOfTheirType) {
+  for (const int type : {0, 1, 2, 3, 4, 5, 6, 7, 9, 10, 11}) {
+    event_.event_type = type;
+    EXPECT_EQ(Run(15), 0);
+    EXPECT_THAT(script.calls, ElementsAre(std::to_string(type)));
+  }
+  for (const int type : {8, 12, 13, 1000, -1}) {
+    event_.event_type = type;
+    EXPECT_EQ(Run(15), 0);
+    EXPECT_TRUE(script.calls.empty()) << type;
+  }
+  EXPECT_EQ(EffectMain<ProbeEffect>(15, &in_, &out_, nullptr, nullptr, nullptr), 0);
+}
+
+TEST_F(EntryTest, WhatAnyOperationThrowsBecomesTheHostsCode) {
+  struct Failure {
+    std::function<void()> thrown;
+    HX_Err code;
+    const char* report;
+  };
+  const Failure failures[] = {
+      {[] { throw std::int32_t{514}; }, 514, nullptr},
+      {[] { throw std::int32_t{-108}; }, -108, nullptr},
+      {[] { throw std::bad_alloc(); }, 4, "out of memory"},
+      {[] { throw std::bad_array_new_length(); }, 4, "out of memory"},
+      {[] { throw std::runtime_error("numeric"); }, 1, "unknown exception"},
+      {[] { tessel::config::ThrowError("a text", 514); }, 1, "unknown exception"},
+      {[] { throw "a literal"; }, 1, "unknown exception"},
+      {[] { throw std::uint32_t{514}; }, 1, "unknown exception"},
+      {[] { throw std::int64_t{514}; }, 1, "unknown exception"},
+  };
+  for (const Failure& failure : failures) {
+    script.operation = failure.thrown;
+    for (const auto& [command, operation] : kOperations) {
+      EXPECT_EQ(Run(command), failure.code) << operation;
+      if (failure.report) {
+        EXPECT_THAT(script.calls, ElementsAre(operation, failure.report));
+      } else {
+        EXPECT_THAT(script.calls, ElementsAre(operation));
+      }
+    }
+  }
+  script.operation = [] {};
+  EXPECT_EQ(Run(27), 0);
+}
+
+TEST_F(EntryTest, AReportThatFailsKeepsTheCode) {
+  const std::function<void()> failures[] = {[] { throw std::int32_t{13}; },
+                                            [] { throw std::bad_alloc(); },
+                                            [] { throw std::runtime_error("report"); }};
+  for (const auto& failure : failures) {
+    script.report = failure;
+    script.operation = [] { throw std::bad_alloc(); };
+    EXPECT_EQ(Run(11), 4);
+    script.operation = [] { throw 1.5; };
+    EXPECT_EQ(Run(11), 1);
+  }
+}
+
+TEST_F(EntryTest, ParametersAreAddedInOrderUntilOneFails) {
+  EXPECT_EQ(Run(4), 0);
+  EXPECT_THAT(script.calls, ElementsAre("DeclareParams", "AddParam 0", "AddParam 1", "AddParam 2",
+                                        "AddParam 3", "AddParam 4"));
+  EXPECT_EQ(out_.num_params, 5);
+  out_.num_params = 0;
+  script.add_param_code = 77;
+  EXPECT_EQ(Run(4), 77);
+  EXPECT_EQ(script.calls.back(), "AddParam 3");
+  EXPECT_EQ(out_.num_params, 0);
+}
+
+#if defined(__x86_64__) && defined(__linux__)
+// There a pointer to a virtual member holds 1 plus the byte offset of its place in the table.
+template <typename Member>
+std::size_t Place(Member member) {
+  std::size_t word = 0;
+  std::memcpy(&word, &member, sizeof(word));
+  return (word - 1) / sizeof(void*);
+}
+
+TEST_F(EntryTest, OperationsStandInTheOrderThatOtherCallersKnow) {
+  using G = GenericEffect;
+  const std::vector<std::size_t> places = {Place(&G::ShowAbout),
+                                           Place(&G::PrepareFrame),
+                                           Place(&G::StartPlugin),
+                                           Place(&G::DeclareParams),
+                                           Place(&G::StopPlugin),
+                                           Place(&G::CreateInstance),
+                                           Place(&G::RestoreInstance),
+                                           Place(&G::FlattenInstance),
+                                           Place(&G::OpenOptions),
+                                           Place(&G::ParamChanged),
+                                           Place(&G::RefreshParams),
+                                           Place(&G::DestroyInstance),
+                                           Place(&G::IdleTick),
+                                           Place(&G::RenderFrame),
+                                           Place(&G::PlanFrame),
+                                           Place(&G::RenderPlannedFrame),
+                                           Place(&G::CustomDataOp),
+                                           Place(&G::Event0),
+                                           Place(&G::Event1),
+                                           Place(&G::Event2),
+                                           Place(&G::Event3),
+                                           Place(&G::Event4),
+                                           Place(&G::Event5),
+                                           Place(&G::Event6),
+                                           Place(&G::Event7),
+                                           Place(&G::Event9),
+                                           Place(&G::Event10),
+                                           Place(&G::Event11),
+                                           Place(&G::DispatchEvent),
+                                           Place(&G::ReportOutOfMemory),
+                                           Place(&G::ReportUnknownException),
+                                           Place(&G::AddParam)};
+  ASSERT_EQ(places.size(), 32u);
+  for (std::size_t i = 0; i < places.size(); ++i) EXPECT_EQ(places[i], i);
+}
+#endif
+
+}  // namespace
+}  // namespace kelp::effect

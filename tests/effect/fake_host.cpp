@@ -1,0 +1,314 @@
+#include "tests/effect/fake_host.h"
+
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <sstream>
+
+#include "platform/tessel/utility.h"
+
+struct HX_HandleRecord {
+  std::vector<unsigned char> block;
+  int locks = 0;
+};
+
+namespace {
+
+FakeHost* current = nullptr;
+
+int BytesOfPixel(std::uint32_t format) {
+  return format == HX_FORMAT_ARGBF ? 16 : format == HX_FORMAT_ARGB16 ? 8 : 4;
+}
+
+}  // namespace
+
+// The interface's functions; they find the fake through `current`.
+struct FakeHostCallbacks {
+  using Lock = std::lock_guard<std::recursive_mutex>;
+
+  static HX_Err Acquire(const char* name, std::int32_t version, const void** table) {
+    Lock lock(current->mutex_);
+    const auto found = current->suites_.find({name, version});
+    const bool fails =
+        current->Operate(std::string("acquire ") + name + " " + std::to_string(version));
+    if (fails || found == current->suites_.end() || current->refused_.count(name)) {
+      return HX_ERR_MISSING_SUITE + 1000;  // the effect has a code of its own for this
+    }
+    *table = found->second;
+    ++current->acquired_[{name, version}];
+    return HX_ERR_NONE;
+  }
+  static HX_Err Release(const char* name, std::int32_t version) {
+    Lock lock(current->mutex_);
+    current->Expect(--current->acquired_[{name, version}] >= 0, "released a suite once too often");
+    return HX_ERR_NONE;
+  }
+
+  static HX_Err CheckoutParam(HX_EffectRef, std::int32_t index, std::int32_t time, std::int32_t,
+                              std::uint32_t, HX_ParamDef* param) {
+    Lock lock(current->mutex_);
+    if (current->Operate("checkout_param")) return FakeHost::kFault;
+    if (index < 0 || static_cast<std::size_t>(index) >= current->params.size()) {
+      return HX_ERR_UNKNOWN;
+    }
+    *param = current->params[static_cast<std::size_t>(index)];
+    current->checkout_times.push_back(time);
+    ++current->checkouts_;
+    return HX_ERR_NONE;
+  }
+  static HX_Err CheckinParam(HX_EffectRef, HX_ParamDef*) {
+    Lock lock(current->mutex_);
+    current->Expect(--current->checkouts_ >= 0, "checked in once too often");
+    return HX_ERR_NONE;
+  }
+  static HX_Err AddParam(HX_EffectRef, std::int32_t index, const HX_ParamDef* param) {
+    Lock lock(current->mutex_);
+    if (current->Operate("add_param")) return FakeHost::kFault;
+    if (index != -1) return HX_ERR_UNKNOWN;
+    current->params.push_back(*param);
+    return HX_ERR_NONE;
+  }
+
+  static HX_Err OpenStrings(HX_EffectRef, std::uint32_t number, const HX_StringTable* table,
+                            std::uint64_t* token) {
+    Lock lock(current->mutex_);
+    if (current->Operate("open_strings")) return FakeHost::kFault;
+    if (number != table->number) return HX_ERR_UNKNOWN;
+    *token = ++current->last_token_;
+    current->strings_[*token] =
+        std::make_unique<tessel::config::StringTable>(table->literals, table->count);
+    return HX_ERR_NONE;
+  }
+  static const char* GetString(std::uint64_t token, std::int32_t index, std::int32_t,
+                               std::int32_t) {
+    Lock lock(current->mutex_);
+    const auto found = current->strings_.find(token);
+    return found == current->strings_.end() ? nullptr : found->second->Get(index);
+  }
+  static void CloseStrings(std::uint64_t token) {
+    Lock lock(current->mutex_);
+    current->Expect(current->strings_.erase(token) == 1, "closed a string table that is not open");
+  }
+
+  static HX_Handle NewHandle(std::uint64_t size) {
+    Lock lock(current->mutex_);
+    if (current->Operate("new_handle")) return nullptr;
+    auto* handle = new HX_HandleRecord{std::vector<unsigned char>(size), 0};
+    current->handles_.insert(handle);
+    return handle;
+  }
+  static void* LockHandle(HX_Handle handle) {
+    Lock lock(current->mutex_);
+    if (current->Operate("lock_handle")) return nullptr;
+    ++handle->locks;
+    return handle->block.data();
+  }
+  static void UnlockHandle(HX_Handle handle) {
+    Lock lock(current->mutex_);
+    current->Expect(handle->locks > 0, "unlocked once too often");
+    if (--handle->locks == 0) handle->block = std::vector<unsigned char>(handle->block);
+  }
+  static void DisposeHandle(HX_Handle handle) {
+    Lock lock(current->mutex_);
+    const bool was_ours = current->handles_.erase(handle) == 1;
+    current->Expect(was_ours && handle->locks == 0, "disposed of a locked or unknown handle");
+    if (was_ours) delete handle;
+  }
+  static HX_Err ResizeHandle(HX_Handle* handle, std::uint64_t size) {
+    Lock lock(current->mutex_);
+    if (current->Operate("resize_handle")) return FakeHost::kFault;
+    current->Expect((*handle)->locks == 0, "resized a locked handle");
+    (*handle)->block.resize(size);
+    return HX_ERR_NONE;
+  }
+  static std::uint64_t HandleSize(HX_Handle handle) {
+    Lock lock(current->mutex_);
+    return handle->block.size();
+  }
+
+  static std::int32_t Format(char* buffer, const char* text, ...) {
+    va_list values;
+    va_start(values, text);
+    const int size = std::vsnprintf(buffer, 512, text, values);
+    va_end(values);
+    return size;
+  }
+  static void CopyText(char* to, std::uint32_t size, const char* from) {
+    const std::string text = tessel::utility::CutToBytes(from, size - 1);
+    std::memcpy(to, text.c_str(), text.size() + 1);
+  }
+
+  static HX_Err UpdateParamUI(HX_EffectRef, std::int32_t index, const HX_ParamDef* param) {
+    Lock lock(current->mutex_);
+    if (current->Operate("Param Utils.UpdateParamUI")) return FakeHost::kFault;
+    HX_ParamDef& own = current->params.at(static_cast<std::size_t>(index));
+    std::memcpy(own.name, param->name, sizeof(own.name));
+    own.flags = param->flags;
+    own.ui_flags = param->ui_flags;
+    return HX_ERR_NONE;
+  }
+  static HX_Err SetParamValue(HX_EffectRef, std::int32_t index, const HX_ParamDef* param) {
+    Lock lock(current->mutex_);
+    if (current->Operate("Param Utils.SetParamValue")) return FakeHost::kFault;
+    current->params.at(static_cast<std::size_t>(index)).u = param->u;
+    return HX_ERR_NONE;
+  }
+
+  static HX_Err ConvertText(const std::uint16_t* from, char* to, std::uint32_t max) {
+    if (Lock lock(current->mutex_); current->Operate("Private Effect.ConvertText")) {
+      return FakeHost::kFault;
+    }
+    std::u16string text;
+    for (; *from; ++from) text += static_cast<char16_t>(*from);
+    CopyText(to, max, tessel::utility::ToUTF8(text).c_str());
+    return HX_ERR_NONE;
+  }
+  static HX_Err ForceRerender(HX_EffectRef) {
+    Lock lock(current->mutex_);
+    if (current->Operate("Private Effect.ForceRerender")) return FakeHost::kFault;
+    ++current->rerenders_;
+    return HX_ERR_NONE;
+  }
+
+  static HX_Err NewWorld(HX_EffectRef, std::int32_t width, std::int32_t height, std::uint8_t,
+                         std::uint32_t format, HX_World* world) {
+    Lock lock(current->mutex_);
+    if (current->Operate("World.NewWorld")) return FakeHost::kFault;
+    const int row_bytes = width * BytesOfPixel(format);
+    void* data = ::operator new(static_cast<std::size_t>(row_bytes) * height);
+    std::memset(data, 0, static_cast<std::size_t>(row_bytes) * height);
+    current->worlds_.insert(data);
+    *world = {data,
+              row_bytes,
+              width,
+              height,
+              format == HX_FORMAT_ARGB16 ? std::uint32_t{HX_WORLD_DEEP} : 0U,
+              0,
+              0,
+              format,
+              {0, 0, width, height}};
+    return HX_ERR_NONE;
+  }
+  static HX_Err DisposeWorld(HX_EffectRef, HX_World* world) {
+    Lock lock(current->mutex_);
+    const bool was_ours = current->worlds_.erase(world->data) == 1;
+    current->Expect(was_ours, "disposed of an unknown world");
+    if (was_ours) ::operator delete(world->data);
+    *world = {};
+    return HX_ERR_NONE;
+  }
+
+  static constexpr HX_BasicSuite kBasic = {Acquire, Release};
+  static constexpr HX_ParamUtilsSuite3 kParamUtils = {UpdateParamUI, SetParamValue};
+  static constexpr HX_PrivateEffectSuite3 kPrivate = {ConvertText, nullptr, nullptr, nullptr,
+                                                      ForceRerender};
+  static constexpr HX_WorldSuite2 kWorlds = {NewWorld, DisposeWorld};
+
+  static const HX_Callbacks& Callbacks() {
+    static const HX_Callbacks callbacks = [] {
+      HX_Callbacks cb{};
+      cb.checkout_param = CheckoutParam;
+      cb.checkin_param = CheckinParam;
+      cb.add_param = AddParam;
+      cb.open_strings = OpenStrings;
+      cb.get_string = GetString;
+      cb.close_strings = CloseStrings;
+      cb.new_handle = NewHandle;
+      cb.lock_handle = LockHandle;
+      cb.unlock_handle = UnlockHandle;
+      cb.dispose_handle = DisposeHandle;
+      cb.resize_handle = ResizeHandle;
+      cb.handle_size = HandleSize;
+      cb.format = Format;
+      cb.copy_text = CopyText;
+      return cb;
+    }();
+    return callbacks;
+  }
+};
+
+FakeHost::FakeHost() : params(1) {
+  if (current) std::abort();
+  current = this;
+  Offer(HX_PARAM_UTILS_SUITE, HX_PARAM_UTILS_SUITE_VERSION, &FakeHostCallbacks::kParamUtils);
+  Offer(HX_PRIVATE_EFFECT_SUITE, HX_PRIVATE_EFFECT_SUITE_VERSION, &FakeHostCallbacks::kPrivate);
+  Offer(HX_WORLD_SUITE, HX_WORLD_SUITE_VERSION, &FakeHostCallbacks::kWorlds);
+  in.basic = &FakeHostCallbacks::kBasic;
+  in.cb = &FakeHostCallbacks::Callbacks();
+  in.effect_ref = reinterpret_cast<HX_EffectRef>(this);
+  in.width = 640;
+  in.height = 480;
+  in.pixel_aspect = {1, 1};
+  in.time_step = 1;
+  in.time_scale = 25;
+  in.downsample_x = in.downsample_y = {1, 1};
+  Prepare();
+}
+
+FakeHost::~FakeHost() {
+  for (const HX_Handle handle : handles_) delete handle;
+  for (void* data : worlds_) ::operator delete(data);
+  current = nullptr;
+}
+
+void FakeHost::Prepare() {
+  out = {};
+  out.instance_handle = in.instance_handle;
+  out.global_data = in.global_data;
+}
+
+HX_Err FakeHost::Call(HX_EffectMain entry, std::uint32_t command, HX_ParamDef* parameters[],
+                      HX_World* output, void* extra) {
+  Prepare();
+  const HX_Err code = entry(command, &in, &out, parameters, output, extra);
+  in.instance_handle = out.instance_handle;
+  in.global_data = out.global_data;
+  return code;
+}
+
+void FakeHost::FailOperation(int n) {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  fail_in_ = n;
+}
+
+void FakeHost::Offer(const std::string& name, std::int32_t version, const void* table) {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  suites_[{name, version}] = table;
+}
+
+int FakeHost::rerenders() const {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  return rerenders_;
+}
+
+std::string FakeHost::handle_bytes(HX_Handle handle) const {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  return std::string(handle->block.begin(), handle->block.end());
+}
+
+std::string FakeHost::Leaks() const {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  std::ostringstream text;
+  for (const HX_Handle handle : handles_) {
+    text << "handle of " << handle->block.size() << " bytes, " << handle->locks << " locks\n";
+  }
+  for (const auto& [suite, count] : acquired_) {
+    if (count != 0) text << suite.first << " " << suite.second << ": " << count << " uses\n";
+  }
+  for (const std::string& mistake : mistakes_) text << mistake << "\n";
+  if (checkouts_ != 0) text << checkouts_ << " checkouts\n";
+  if (!worlds_.empty()) text << worlds_.size() << " worlds\n";
+  if (!strings_.empty()) text << strings_.size() << " string tables\n";
+  return text.str();
+}
+
+void FakeHost::Expect(bool holds, const char* mistake) {
+  if (!holds) mistakes_.push_back(mistake);
+}
+
+bool FakeHost::Operate(const std::string& name) {
+  const bool fails = fail_in_ > 0 && --fail_in_ == 0;
+  operations_.push_back({name, fails});
+  return fails;
+}

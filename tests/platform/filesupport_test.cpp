@@ -1,0 +1,204 @@
+#include "platform/tessel/filesupport.h"
+
+#include <gtest/gtest.h>
+
+#include <boost/logic/tribool.hpp>
+#include <fstream>
+#include <iterator>
+#include <limits>
+#include <random>
+#include <string>
+
+namespace tessel::filesupport {
+namespace {
+
+using boost::logic::tribool;
+
+const utility::Guid kGuid = utility::Guid::FromText("00112233-4455-6677-8899-aabbccddeeff");
+
+void WriteOneOfEach(OutputByteStream& out) {
+  out << std::int32_t{-2} << std::uint32_t{0x53746162} << std::int64_t{-3} << std::uint64_t{4}
+      << true << tribool(false) << tribool(boost::logic::indeterminate)
+      << std::u16string(u"h\u00e9") << kGuid;
+}
+
+void ReadOneOfEach(InputByteStream& in) {
+  std::int32_t i32 = 0;
+  std::uint32_t u32 = 0;
+  std::int64_t i64 = 0;
+  std::uint64_t u64 = 0;
+  bool flag = false;
+  tribool no = true, unknown = true;
+  std::u16string text;
+  utility::Guid guid;
+  in >> i32 >> u32 >> i64 >> u64 >> flag >> no >> unknown >> text >> guid;
+  EXPECT_EQ(i32, -2);
+  EXPECT_EQ(u32, 0x53746162u);
+  EXPECT_EQ(i64, -3);
+  EXPECT_EQ(u64, 4u);
+  EXPECT_TRUE(flag);
+  EXPECT_TRUE(static_cast<bool>(!no));
+  EXPECT_TRUE(boost::logic::indeterminate(unknown));
+  EXPECT_EQ(text, u"h\u00e9");
+  EXPECT_EQ(guid, kGuid);
+}
+
+TEST(ByteStreamTest, EveryTypeHasItsBytes) {
+  OStringByteStream out;
+  WriteOneOfEach(out);
+  using namespace std::string_literals;
+  EXPECT_EQ(out.bytes(),
+            "\xfe\xff\xff\xff"s
+            "batS"
+            "\xfd\xff\xff\xff\xff\xff\xff\xff"
+            "\4\0\0\0\0\0\0\0"s
+            "\1\0\2"s
+            "\2\0\0\0h\0\xe9\0"s
+            "\x00\x11\x22\x33\x44\x55\x66\x77\x88\x99\xaa\xbb\xcc\xdd\xee\xff"s);
+  IStringByteStream in(out.bytes().data(), out.bytes().size());
+  ReadOneOfEach(in);
+  EXPECT_EQ(in.MaxBytesLeft(), 0u);
+}
+
+TEST(ByteStreamTest, CutAndAbsurdDataThrows) {
+  OStringByteStream out;
+  WriteOneOfEach(out);
+  for (std::size_t size = 0; size < out.bytes().size(); ++size) {
+    IStringByteStream in(out.bytes().data(), size);
+    EXPECT_THROW(ReadOneOfEach(in), StreamError) << size;
+  }
+  bool flag = false;
+  tribool maybe;
+  IStringByteStream two("\2", 1), three("\3", 1);
+  EXPECT_THROW(two >> flag, StreamError);
+  EXPECT_THROW(three >> maybe, StreamError);
+  std::u16string text;
+  IStringByteStream huge(
+      "\xff\xff\xff\xff"
+      "ab",
+      6);  // 8 GiB of text
+  EXPECT_THROW(huge >> text, StreamError);
+}
+
+// Bytes of two kinds: such as deflate shortens much and such as it can't.
+std::string Sample(std::size_t size) {
+  std::mt19937 random(1);
+  std::string bytes(size, 'a');
+  for (std::size_t i = size / 2; i < size; ++i) bytes[i] = static_cast<char>(random());
+  return bytes;
+}
+
+std::string Zipped(const std::string& bytes) {
+  OStringByteStream out;
+  OZipByteStream zip(out);
+  WriteOneOfEach(zip);
+  for (std::size_t i = 0; i < bytes.size(); i += 1000) {  // in pieces
+    zip.Write(bytes.data() + i, std::min<std::size_t>(1000, bytes.size() - i));
+  }
+  zip.Close();
+  zip.Close();
+  EXPECT_THROW(zip.Write("x", 1), StreamError);
+  return out.Take();
+}
+
+std::string Unzipped(const std::string& zipped, std::size_t size) {
+  IStringByteStream in(zipped.data(), zipped.size());
+  IZipByteStream zip(in);
+  EXPECT_GE(zip.MaxBytesLeft(), zipped.empty() ? 0 : size);
+  ReadOneOfEach(zip);
+  std::string bytes(size, '\0');
+  zip.Read(bytes.data(), size);
+  zip.Finish();
+  return bytes;
+}
+
+TEST(ZipStreamTest, SmallAndLargeDataRoundTrips) {
+  for (const std::size_t size : {std::size_t{0}, std::size_t{1}, std::size_t{300000}}) {
+    const std::string bytes = Sample(size), zipped = Zipped(bytes);
+    EXPECT_EQ(zipped.front(), 0x78);  // zlib's format, window of 32 KiB
+    EXPECT_EQ(Unzipped(zipped, size), bytes);
+    EXPECT_LT(zipped.size(), size * 6 / 10 + 100);
+  }
+}
+
+TEST(ZipStreamTest, CutAtEveryByteThrows) {
+  const std::string zipped = Zipped(Sample(400));
+  for (std::size_t size = 0; size < zipped.size(); ++size) {
+    EXPECT_THROW(Unzipped(zipped.substr(0, size), 400), StreamError) << size;
+  }
+}
+
+// A few bits of the format mean nothing; all others must be missed by somebody.
+TEST(ZipStreamTest, AFlippedBitNeverGivesOtherData) {
+  const std::string zipped = Zipped(Sample(200));
+  const auto read_all = [](const std::string& damaged) {
+    IStringByteStream in(damaged.data(), damaged.size());
+    IZipByteStream zip(in);
+    std::string all(64, '\0');
+    for (std::size_t end = 0;; all.resize(end + 64)) {
+      const std::size_t got = zip.ReadSome(all.data() + end, 64);
+      if (got == 0) return all.substr(0, end);
+      end += got;
+    }
+  };
+  const std::string whole = read_all(zipped);
+  std::size_t found = 0;
+  for (std::size_t i = 0; i < zipped.size() * 8; ++i) {
+    std::string damaged = zipped;
+    damaged[i / 8] = static_cast<char>(damaged[i / 8] ^ 1 << i % 8);
+    try {
+      EXPECT_EQ(read_all(damaged), whole) << "bit " << i;
+    } catch (const StreamError&) {
+      ++found;
+    }
+  }
+  EXPECT_GT(found, zipped.size() * 8 - 16);
+}
+
+TEST(ZipStreamTest, MoreDataThanWasReadIsTold) {
+  const std::string zipped = Zipped("abc");
+  IStringByteStream in(zipped.data(), zipped.size());
+  IZipByteStream zip(in);
+  ReadOneOfEach(zip);
+  EXPECT_THROW(zip.Finish(), StreamError);
+}
+
+TEST(ZipStreamTest, TheBoundHoldsForTheMostCompactData) {
+  OStringByteStream out;
+  OZipByteStream writer(out);
+  constexpr std::size_t kSize = 20 << 20;
+  writer.Write(std::string(kSize, '\0').data(), kSize);
+  writer.Close();
+  IStringByteStream in(out.bytes().data(), out.bytes().size());
+  IZipByteStream zip(in);
+  std::string piece(1 << 16, 'x');
+  for (std::size_t read = 0; read < kSize; read += piece.size()) {
+    ASSERT_GE(zip.MaxBytesLeft(), kSize - read);
+    zip.Read(piece.data(), piece.size());
+  }
+  zip.Finish();
+  EXPECT_EQ(zip.MaxBytesLeft(), 0u);
+}
+
+TEST(FileTest, TruncatesAndTellsOfFailures) {
+  const std::string path = ::testing::TempDir() + "calmframe_\u00e9.bin";
+  for (const std::string text : {"longer text", "text"}) {
+    File file;
+    ASSERT_TRUE(file.OpenForWriting(path));
+    EXPECT_TRUE(file.Write(text.data(), text.size()));
+    EXPECT_TRUE(file.Close());
+    std::ifstream in(path, std::ios::binary);
+    EXPECT_EQ(std::string(std::istreambuf_iterator<char>(in), {}), text);
+  }
+  std::remove(path.c_str());
+  File file;
+  EXPECT_FALSE(file.OpenForWriting(path + "/no/such/folder"));
+  EXPECT_FALSE(file.Write("x", 1));
+  if (file.OpenForWriting("/dev/full")) {
+    file.Write("x", 1);
+    EXPECT_FALSE(file.Close());
+  }
+}
+
+}  // namespace
+}  // namespace tessel::filesupport

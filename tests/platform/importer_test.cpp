@@ -1,0 +1,69 @@
+#include "platform/tessel/importer.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <memory>
+#include <thread>
+#include <vector>
+
+#include "platform/tessel/threads.h"
+
+namespace tessel::importer {
+namespace {
+
+TEST(ImporterTest, CallbacksHearOfPausesAndOfOneThatIsOn) {
+  std::vector<bool> early, late;
+  const utility::Guid first = RegisterPauseCallback([&](bool pause) { early.push_back(pause); });
+  PauseBackgroundWork(true);
+  const utility::Guid second = RegisterPauseCallback([&](bool pause) { late.push_back(pause); });
+  EXPECT_NE(first, second);
+  EXPECT_EQ(late, std::vector<bool>({true}));
+  UnregisterPauseCallback(first);
+  PauseBackgroundWork(false);
+  UnregisterPauseCallback(second);
+  UnregisterPauseCallback(second);
+  PauseBackgroundWork(true);
+  PauseBackgroundWork(false);
+  EXPECT_EQ(early, std::vector<bool>({true}));
+  EXPECT_EQ(late, std::vector<bool>({true, false}));
+}
+
+TEST(ImporterTest, UnregisteringWaitsForARunningCallback) {
+  threads::CompletionEvent running, go_on;
+  bool ended = false;  // plain: unregistering orders the accesses
+  const utility::Guid id = RegisterPauseCallback([&](bool pause) {
+    if (!pause) return;
+    running.Signal();
+    go_on.WaitFor(std::chrono::milliseconds(20));
+    ended = true;
+  });
+  std::thread host([] { PauseBackgroundWork(true); });
+  running.Wait();
+  UnregisterPauseCallback(id);
+  EXPECT_TRUE(ended);
+  host.join();
+  PauseBackgroundWork(false);
+}
+
+TEST(ImporterTest, ACallbackMayDropTheLastOwnerOfAnother) {
+  struct Owner {
+    ~Owner() { UnregisterPauseCallback(id); }
+    utility::Guid id;
+  };
+  std::atomic<int> calls{0};
+  std::vector<std::unique_ptr<Owner>> owners;
+  for (int i = 0; i < 4; ++i) {
+    owners.push_back(std::make_unique<Owner>());
+    owners.back()->id = RegisterPauseCallback([&](bool) {
+      ++calls;
+      owners.clear();
+    });
+  }
+  PauseBackgroundWork(true);
+  PauseBackgroundWork(false);
+  EXPECT_EQ(calls, 1);
+}
+
+}  // namespace
+}  // namespace tessel::importer
