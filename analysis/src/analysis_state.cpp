@@ -1,0 +1,44 @@
+#include "analysis/src/analysis_state.h"
+
+#include <boost/make_shared.hpp>
+
+#include "platform/tessel/utility.h"
+
+namespace kelp::analysis {
+
+void AnalysisState::MakeResultIdentityUnique() {
+  result_identity = tessel::utility::Guid::MakeUnique();
+}
+
+void AnalysisState::Begin(HX_InData* host_in, HX_OutData* host_out,
+                          const marrow::tracking::SelectorParams& selector,
+                          const marrow::tracking::TrackerParams& tracker, bool with_details,
+                          const JobFactory& make_job) {
+  EndAnalyzer(host_in, host_out);
+  analyzer = boost::make_shared<AnalyzerPrem>(host_in, host_out, selector, tracker, make_job);
+  detailed = with_details;
+  progress = ProgressClock{tessel::utility::HighPrecisionTime::Now(), 0, 0};
+  error_text.clear();
+}
+
+void AnalysisState::EndAnalyzer(HX_InData* host_in, HX_OutData* host_out) {
+  if (!analyzer) return;
+  if (analyzer->IsActive()) analyzer->Cancel(host_in, host_out, "");
+  // Of an ended job too: else its table would stay in the registry for ever.
+  analyzer->Stop(host_in, host_out);
+  analyzer.reset();
+}
+
+bool AnalysisState::TakeResults() {
+  const boost::shared_ptr<marrow::tracking::AllFeatures> features =
+      analyzer ? analyzer->GetFeatures() : boost::shared_ptr<marrow::tracking::AllFeatures>();
+  if (!features) return false;
+  all_features = *features;
+  first_frame = static_cast<std::int32_t>(analyzer->FirstRunFrame());
+  job_input = analyzer->record().job_input_parameters;
+  tracker_identity = analyzer->GetTrackerGuid();
+  MakeResultIdentityUnique();
+  return true;
+}
+
+}  // namespace kelp::analysis

@@ -1,0 +1,62 @@
+#pragma once
+
+#include <boost/logic/tribool.hpp>
+#include <boost/shared_ptr.hpp>
+#include <cstdint>
+#include <string>
+
+#include "analysis/src/analyzer.h"
+#include "analysis/src/progress.h"
+
+namespace kelp::analysis {
+
+// What an effect instance keeps of its analysis: the result with the identities of what it was made
+// from, and the analyzer while one is at work. The host's main thread only. The order of the
+// virtual operations is part of the interface.
+class AnalysisState {
+ public:
+  AnalysisState() = default;
+  AnalysisState(const AnalysisState&) = delete;
+  AnalysisState& operator=(const AnalysisState&) = delete;
+
+  // The results have changed: whoever kept something made from them can see it.
+  virtual void MakeResultIdentityUnique();
+  virtual ~AnalysisState() = default;
+  // Whether work beyond the analysis still runs on the results.
+  virtual bool IsWorkingOnResults() const { return false; }
+
+  // A new analysis: ends the one at work, if any, and makes an analyzer that has not started. The
+  // older result stays. Throws what reading the job input throws.
+  void Begin(HX_InData* host_in, HX_OutData* host_out,
+             const marrow::tracking::SelectorParams& selector,
+             const marrow::tracking::TrackerParams& tracker, bool detailed,
+             const JobFactory& make_job);
+  // Cancels and stops the analyzer, if any, and drops it.
+  void EndAnalyzer(HX_InData* host_in, HX_OutData* host_out);
+  // Takes over the results of the analyzer's job and what they were made from. False, and nothing
+  // changes, if there are none.
+  bool TakeResults();
+
+  JobInput job_input;                      // of the result
+  tessel::utility::Guid source_identity;   // GetUpstreamIdentifier; nil if not known
+  tessel::utility::Guid tracker_identity;  // GetIdentifierForTracker of the result
+  marrow::tracking::AllFeatures all_features;
+  std::int32_t first_frame = 0;  // absolute index of the table's row 0; fields count as frames
+  std::int32_t source_width = 0, source_height = 0;  // when the result was made
+  std::int32_t par_num = 1;
+  std::uint32_t par_den = 1;
+  boost::shared_ptr<Analyzer> analyzer;
+  ProgressClock progress;
+  std::string error_text;
+  tessel::utility::Guid result_identity;
+  tessel::utility::Guid solve_input_identity;
+  tessel::utility::Guid deletion_identity;  // of the tracks that the user deleted
+
+  bool analysis_pending = false;
+  bool first_analysis = false;
+  // The Detailed Analysis control that the analysis was begun with.
+  boost::logic::tribool detailed = boost::logic::indeterminate;
+  tessel::utility::Guid button_identity;  // of what the two buttons show
+};
+
+}  // namespace kelp::analysis

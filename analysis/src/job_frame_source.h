@@ -1,0 +1,58 @@
+#pragma once
+
+#include <cstdint>
+
+#include "analysis/src/job.h"
+#include "tracking/frame_preparation.h"
+#include "tracking/frame_source.h"
+
+namespace kelp::analysis {
+
+// Where the rows of a run lie on the clip.
+struct RunFrames {
+  std::int64_t first_frame = 0;  // absolute index of row 0; fields count as frames
+  std::int64_t frame_count = 0;  // 0 where the clip has no length
+  RationalTime duration;         // of a row
+};
+
+RunFrames GetRunFrames(const JobInput& input);
+
+// The frames of a job as the tracker wants them. Colour, luma and mask are fetched apart, each one
+// frame ahead; the host renders a frame that several ask for once. Throws TerminateException from
+// the first fetch after the job has left Running.
+class JobFrameSource final : public marrow::tracking::FrameSource {
+ public:
+  // The job outlives it. Orders the first two frames.
+  explicit JobFrameSource(Job& job);
+  // Drops what ReleaseFrames was not asked to release.
+  ~JobFrameSource() override;
+
+  std::size_t width() const override { return static_cast<std::size_t>(mask_.width); }
+  std::size_t height() const override { return static_cast<std::size_t>(mask_.height); }
+  std::size_t frame_count() const override { return static_cast<std::size_t>(run_.frame_count); }
+  void LoadLuma(std::size_t frame, float* destination) override;
+  void LoadMask(std::size_t frame, std::uint8_t* destination) override;
+  void LoadColor(std::size_t frame, float* destination) override;
+
+  // Releases the frames that are still held: colour, luma, mask.
+  void ReleaseFrames();
+
+ private:
+  struct Reader {
+    std::int32_t width = 0, height = 0;
+    std::int64_t last_frame = -1;  // not released yet; -1 is none
+  };
+
+  void Prepare(Reader& reader);
+  template <class Convert>
+  void Load(Reader& reader, std::size_t frame, const Convert& convert);
+  void Release(Reader& reader);
+  RationalTime TimeOf(std::int64_t frame) const;
+  std::int32_t FieldOf(std::int64_t frame) const;
+
+  Job& job_;
+  const RunFrames run_;
+  Reader mask_, luma_, color_;
+};
+
+}  // namespace kelp::analysis
