@@ -3,7 +3,7 @@
 #include <array>
 #include <cstdint>
 
-#include "stabilizer/effect/src/parameter_reader.h"
+#include "effect/parameter_reader.h"
 #include "stabilizer/effect/src/parameter_table.h"
 
 namespace kelp::effect {

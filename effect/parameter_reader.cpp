@@ -1,4 +1,4 @@
-#include "stabilizer/effect/src/parameter_reader.h"
+#include "effect/parameter_reader.h"
 
 #include "platform/tessel/debug.h"
 
