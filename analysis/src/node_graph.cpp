@@ -4,6 +4,9 @@
 #include <utility>
 
 namespace kelp::analysis {
+
+using effect::ThrowIfFailed;
+
 namespace {
 
 class SegmentsReference {

@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <string>
 
-#include "analysis/src/host_access.h"
+#include "effect/suite.h"
 
 namespace kelp::analysis {
 
