@@ -65,6 +65,15 @@ std::u16string UnitsToText(const std::uint16_t (&units)[kHostUnits]) {
   return std::u16string(units, std::find(units, units + kHostUnits, 0));
 }
 
+std::string TakeText(const HX_StringSuite1& strings, HX_String string) {
+  const char* bytes = nullptr;
+  const HX_Err code = strings.GetUTF8(string, &bytes);
+  const std::string text = code == HX_ERR_NONE && bytes != nullptr ? bytes : "";
+  strings.Dispose(string);
+  ThrowIfFailed(code);
+  return text;
+}
+
 const char* GetString(const HostContext& context, std::int32_t index) {
   const std::uint64_t token = GlobalsLock(context)->string_token;
   const char* text = context.in->cb->get_string(token, index, 0, 0);

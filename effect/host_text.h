@@ -4,6 +4,7 @@
 #include <string>
 
 #include "effect/host_context.h"
+#include "platform/hx/hx_suites.h"
 
 // Texts on their way to the host. UTF-8 within the effect; the host's form in its records.
 namespace kelp::effect {
@@ -24,6 +25,9 @@ inline constexpr std::uint32_t kHostUnits = 256;
 void ConvertToHostText(const HostContext& context, const std::u16string& text,
                        char (&to)[kHostTextSize]);
 std::u16string UnitsToText(const std::uint16_t (&units)[kHostUnits]);
+
+// The text of a string, which is disposed of. Throws the host's code.
+std::string TakeText(const HX_StringSuite1& strings, HX_String string);
 
 // Text of the string table; "" for a kept place and outside the table. Valid until the plug-in is
 // stopped. Throws HX_ERR_HANDLE_LOCK when the global data can't be reached.

@@ -168,7 +168,7 @@ class AnalysisEffect : public kelp::effect::GenericEffect {
  private:
   void UpdateButton(std::int32_t id, bool enabled, const char* name);
   void BeginPolledAnalysis(AnalysisState& state);
-  void EndPolledAnalysis(AnalysisState& state, bool has_results, bool failed_with_text);
+  void EndPolledAnalysis(AnalysisState& state, bool finished, bool failed_with_text);
   void SaveTrackFile();
 };
 
