@@ -47,7 +47,8 @@ class Layer {
 
   boost::shared_ptr<const LayerState> state() const;
 
-  // Publishes a changed copy of the state; changes come one after the other. Node references that
+  // Publishes a changed copy of the state; changes come one after the other. Throws
+  // std::invalid_argument if it lacks a source or a frame duration. Node references that
   // were given before go on showing the old state.
   void Change(const std::function<void(LayerState& state)>& change);
 

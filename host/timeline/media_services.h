@@ -28,8 +28,9 @@ struct MediaFaults {
 };
 
 struct MediaSettings {
-  // Bound of the frames that nobody references; 0 drops each at once. The default holds some 60
-  // frames of 1920 x 1080 at 8 bits: a synthesis margin of a second on both sides.
+  // Bound of the frame cache. Frames that are referenced count, yet stay; 0 drops all others at
+  // once. The default holds some 60 frames of 1920 x 1080 at 8 bits: a synthesis margin of a second
+  // on both sides.
   std::size_t cache_bytes = std::size_t{512} << 20;
   int render_threads = 2;  // at least 2 are made
 };
@@ -52,6 +53,8 @@ struct InputRequest {
   int width = 0, height = 0;  // 0: the source's
   bool single_field = false;  // the one field of the time, at full height; of interlaced layers
 };
+
+class MediaCore;  // what the operations of the suites work on
 
 // Media, node graph, frame cache and asynchronous rendering of one host process: the suites
 // "Rushbase Sequence Info Suite", "Rushbase Video Segment Suite", "Rushbase Video Segment Render
@@ -97,11 +100,9 @@ class MediaServices {
 
   MediaFaults faults;
 
-  class Core;  // what the suites' tables work on
-  Core& core() { return *core_; }
-
  private:
-  std::unique_ptr<Core> core_;
+  friend class MediaCore;
+  std::unique_ptr<MediaCore> core_;
 };
 
 }  // namespace calmframe::host
