@@ -4,6 +4,8 @@
 #include <cstring>
 #include <exception>
 
+#include "host/pixels/world_buffer.h"
+
 namespace calmframe::host {
 
 using tessel::utility::Guid;
@@ -71,7 +73,8 @@ PicturePtr FrameMaker::Make(const FrameRequest& request, const FrameLayout& layo
 boost::shared_ptr<Picture> FrameMaker::Copy(const Picture& picture, const FrameLayout& layout) {
   const boost::shared_ptr<Picture> copy = pool_->NewPicture(
       picture.kind(), picture.width(), picture.height(), layout.padding, layout.top_down);
-  const std::size_t bytes = BytesOf(picture.kind()) * static_cast<std::size_t>(picture.width());
+  const std::size_t bytes = static_cast<std::size_t>(BytesPerPixel(FormatOf(picture.kind()))) *
+                            static_cast<std::size_t>(picture.width());
   for (int y = 0; y < picture.height(); ++y) {
     std::memcpy(copy->row<std::uint8_t>(y), picture.row<std::uint8_t>(y), bytes);
   }

@@ -9,7 +9,7 @@ namespace {
 using Core = MediaCore;
 
 HX_Err AcquireSegments(HX_EffectRef effect, HX_Segments* segments) {
-  return Operation("AcquireSegments", [=](Core& core) {
+  return Operation("Sequence Info.AcquireSegments", [=](Core& core) {
     const auto attached = core.Find(effect);
     if (!attached || !segments) return HX_ERR_UNKNOWN;
     *segments = core.segments.Add(attached->layer->state());
@@ -18,11 +18,12 @@ HX_Err AcquireSegments(HX_EffectRef effect, HX_Segments* segments) {
 }
 
 HX_Err ReleaseSegments(HX_Segments segments) {
-  return GivingBack("ReleaseSegments", [=](Core& core) { return core.segments.Remove(segments); });
+  return GivingBack("Sequence Info.ReleaseSegments",
+                    [=](Core& core) { return core.segments.Remove(segments); });
 }
 
 HX_Err GetTicksPerFrame(HX_EffectRef effect, int64_t* ticks) {
-  return Operation("GetTicksPerFrame", [=](Core& core) {
+  return Operation("Sequence Info.GetTicksPerFrame", [=](Core& core) {
     const auto attached = core.Find(effect);
     if (!attached || !ticks) return HX_ERR_UNKNOWN;
     *ticks = attached->layer->state()->ticks_per_frame;
@@ -31,7 +32,7 @@ HX_Err GetTicksPerFrame(HX_EffectRef effect, int64_t* ticks) {
 }
 
 HX_Err GetSegmentNodeAt(HX_Segments segments, int64_t ticks, HX_Node* node) {
-  return Operation("GetSegmentNodeAt", [=](Core& core) {
+  return Operation("Video Segment.GetSegmentNodeAt", [=](Core& core) {
     return WithHandle(core.segments, segments, [&](const auto& layer) {
       const auto found = NodeAt(layer, ticks);
       if (!found || !node || core.faults.node_missing) return HX_ERR_UNKNOWN;
@@ -68,23 +69,23 @@ HX_Err Child(HX_Node node, int32_t index, bool is_operator, HX_Node* child, cons
 }
 
 HX_Err GetOperatorCount(HX_Node node, int32_t* count) {
-  return Count(node, count, "GetOperatorCount");
+  return Count(node, count, "Video Segment.GetOperatorCount");
 }
 
 HX_Err GetOperator(HX_Node node, int32_t index, HX_Node* effect_operator) {
-  return Child(node, index, true, effect_operator, "GetOperator");
+  return Child(node, index, true, effect_operator, "Video Segment.GetOperator");
 }
 
 HX_Err GetInputCount(HX_Node node, int32_t* count) {
-  return Count(node, count, "GetInputCount");
+  return Count(node, count, "Video Segment.GetInputCount");
 }
 
 HX_Err GetInput(HX_Node node, int32_t index, HX_Node* input) {
-  return Child(node, index, false, input, "GetInput");
+  return Child(node, index, false, input, "Video Segment.GetInput");
 }
 
 HX_Err GetProperty(HX_Node node, const char* key, HX_String* text) {
-  return Operation("GetProperty", [=](Core& core) {
+  return Operation("Video Segment.GetProperty", [=](Core& core) {
     return WithHandle(core.nodes, node, [&](const GraphNode& found) {
       if (!key || !text) return HX_ERR_UNKNOWN;
       if (core.faults.property_missing && !found.is_operator) return HX_ERR_UNKNOWN;
@@ -97,7 +98,7 @@ HX_Err GetProperty(HX_Node node, const char* key, HX_String* text) {
 }
 
 HX_Err GetNodeGuid(HX_Node node, HX_Guid* guid) {
-  return Operation("GetNodeGuid", [=](Core& core) {
+  return Operation("Video Segment.GetNodeGuid", [=](Core& core) {
     return WithHandle(core.nodes, node, [&](const GraphNode& found) {
       if (found.is_operator || !guid) return HX_ERR_UNKNOWN;
       const auto bytes = IdentityOf(found).bytes();
@@ -108,7 +109,7 @@ HX_Err GetNodeGuid(HX_Node node, HX_Guid* guid) {
 }
 
 HX_Err GetOperatorText(HX_Node effect_operator, HX_String* text) {
-  return Operation("GetOperatorText", [=](Core& core) {
+  return Operation("Video Segment.GetOperatorText", [=](Core& core) {
     return WithHandle(core.nodes, effect_operator, [&](const GraphNode& found) {
       if (!found.is_operator || !text) return HX_ERR_UNKNOWN;
       *text = core.strings.Make(IdentityOf(found).ToText());
@@ -118,7 +119,8 @@ HX_Err GetOperatorText(HX_Node effect_operator, HX_String* text) {
 }
 
 HX_Err ReleaseNode(HX_Node node) {
-  return GivingBack("ReleaseNode", [=](Core& core) { return core.nodes.Remove(node); });
+  return GivingBack("Video Segment.ReleaseNode",
+                    [=](Core& core) { return core.nodes.Remove(node); });
 }
 
 }  // namespace

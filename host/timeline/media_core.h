@@ -1,12 +1,13 @@
 #pragma once
 
 #include <boost/shared_ptr.hpp>
-#include <functional>
 #include <map>
 #include <mutex>
 #include <new>
 #include <optional>
+#include <string>
 
+#include "host/base/operations.h"
 #include "host/timeline/frame_cache.h"
 #include "host/timeline/frame_maker.h"
 #include "host/timeline/handle_table.h"
@@ -34,7 +35,6 @@ class MediaCore {
   void Detach(HX_EffectRef effect);
 
   const MediaFaults& faults;
-  std::function<HX_Err(const char*)> hook;
   FrameCache cache;
   FrameMaker maker;
   HandleTable<HX_Node, GraphNode> nodes;
@@ -50,17 +50,14 @@ class MediaCore {
   RenderQueue queue;  // last: its threads use all of the above
 };
 
-// An operation of a suite: the hook, then the body, which gets the core and returns a code. Nothing
-// is thrown to the caller.
+// An operation of a suite, by the name that Operations knows: unless it is to fail, the body, which
+// gets the core and returns a code. Nothing is thrown to the caller.
 template <class Body>
 HX_Err Operation(const char* name, Body body) noexcept {
   try {
+    if (const HX_Err code = BeginOperation(name)) return code;
     MediaCore* const core = MediaCore::active();
-    if (!core) return HX_ERR_UNKNOWN;
-    if (core->hook) {
-      if (const HX_Err code = core->hook(name)) return code;
-    }
-    return body(*core);
+    return core ? body(*core) : HX_ERR_UNKNOWN;
   } catch (const std::bad_alloc&) {
     return HX_ERR_MEMORY;
   } catch (...) {
@@ -68,15 +65,19 @@ HX_Err Operation(const char* name, Body body) noexcept {
   }
 }
 
-// One that gives something back, which happens whatever the hook says.
+// One that gives something back, which happens even when it is to fail. The body returns false for
+// what was not lent.
 template <class Body>
 HX_Err GivingBack(const char* name, Body body) noexcept {
   try {
+    const HX_Err code = BeginOperation(name);
     MediaCore* const core = MediaCore::active();
     if (!core) return HX_ERR_UNKNOWN;
-    const HX_Err code = body(*core) ? HX_ERR_NONE : HX_ERR_UNKNOWN;
-    const HX_Err hooked = core->hook ? core->hook(name) : HX_ERR_NONE;
-    return hooked ? hooked : code;
+    if (!body(*core)) {
+      Ledger::Get().Mistake(std::string(name) + " of what is not lent");
+      return HX_ERR_UNKNOWN;
+    }
+    return code;
   } catch (...) {
     return HX_ERR_UNKNOWN;
   }

@@ -111,10 +111,6 @@ std::string MediaServices::failure() const {
   return core_->maker.failure();
 }
 
-void MediaServices::SetCallHook(std::function<HX_Err(const char* operation)> hook) {
-  core_->hook = std::move(hook);
-}
-
 void MediaServices::Shutdown() {
   core_->queue.Close();
 }

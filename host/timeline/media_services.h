@@ -4,7 +4,6 @@
 #include <boost/shared_ptr.hpp>
 #include <cstddef>
 #include <cstdint>
-#include <functional>
 #include <memory>
 #include <string>
 
@@ -51,7 +50,7 @@ struct InputRequest {
   std::int64_t time_ticks = 0;  // media time
   PixelKind kind = PixelKind::argb8;
   int width = 0, height = 0;  // 0: the source's
-  bool single_field = false;  // the one field of the time, at full height; of interlaced layers
+  bool single_field = true;   // of an interlaced layer the one field of the time, at full height
 };
 
 class MediaCore;  // what the operations of the suites work on
@@ -84,11 +83,6 @@ class MediaServices {
 
   // First line of what went wrong with the media; empty when all is well.
   std::string failure() const;
-
-  // Called before each operation of these suites with its name; what it returns but 0 is the
-  // operation's result. Operations that give something back have done so all the same. Set before
-  // the first call of a suite.
-  void SetCallHook(std::function<HX_Err(const char* operation)> hook);
 
   // Refuses new renders, calls all outstanding callbacks and waits for them; the rest goes on.
   void Shutdown();

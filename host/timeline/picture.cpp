@@ -3,49 +3,18 @@
 #include <algorithm>
 #include <boost/make_shared.hpp>
 #include <boost/weak_ptr.hpp>
-#include <cmath>
-#include <cstring>
 #include <limits>
 #include <new>
-#include <type_traits>
+
+#include "host/pixels/pixel_rows.h"
+#include "host/pixels/world_buffer.h"
+#include "host/pixels/world_operations.h"
 
 namespace calmframe::host {
 namespace {
 
 // What a bounded cache drops for one new frame, and a little more.
 constexpr std::size_t kSpareBlocks = 3;
-
-template <class Pixel>
-constexpr float kTop = std::is_same_v<Pixel, HX_Pixel8>    ? 255.0f
-                       : std::is_same_v<Pixel, HX_Pixel16> ? 32768.0f
-                                                           : 1.0f;
-
-// action(Pixel{}) with the pixel of the kind.
-template <class Action>
-void WithPixel(PixelKind kind, Action action) {
-  switch (kind) {
-    case PixelKind::argb8:
-      return action(HX_Pixel8{});
-    case PixelKind::argb16:
-      return action(HX_Pixel16{});
-    case PixelKind::argbf:
-      return action(HX_PixelFloat{});
-  }
-}
-
-// Floats may lie outside 0 .. 1.
-template <class Pixel>
-Pixel FromUnit(const HX_PixelFloat& colour) {
-  if constexpr (std::is_same_v<Pixel, HX_PixelFloat>) {
-    return colour;
-  } else {
-    using Sample = decltype(Pixel::alpha);
-    const auto sample = [](float value) {
-      return static_cast<Sample>(std::min(std::max(value, 0.0f), 1.0f) * kTop<Pixel> + 0.5f);
-    };
-    return {sample(colour.alpha), sample(colour.red), sample(colour.green), sample(colour.blue)};
-  }
-}
 
 template <class Sample>
 Sample Average(Sample a, Sample b) {
@@ -70,78 +39,7 @@ void KeepFieldOf(Picture& picture, int parity) {
   }
 }
 
-// The samples that make up one sample of a resized line, with weights of sum 1.
-struct Taps {
-  int first = 0;
-  std::vector<float> weights;
-};
-
-std::vector<Taps> TapsOf(int from, int to) {
-  std::vector<Taps> all(static_cast<std::size_t>(to));
-  const double step = static_cast<double>(from) / to;
-  for (int i = 0; i < to; ++i) {
-    Taps& taps = all[static_cast<std::size_t>(i)];
-    if (step < 1) {
-      const double centre = std::clamp((i + 0.5) * step - 0.5, 0.0, from - 1.0);
-      taps.first = std::min(static_cast<int>(centre), std::max(from - 2, 0));
-      const double second = centre - taps.first;
-      taps.weights = {static_cast<float>(1 - second)};
-      if (from > 1) taps.weights.push_back(static_cast<float>(second));
-      continue;
-    }
-    const double left = i * step, right = std::min((i + 1) * step, static_cast<double>(from));
-    taps.first = static_cast<int>(left);
-    for (int x = taps.first; x < from && x < right; ++x) {
-      const double covered = std::min(x + 1.0, right) - std::max<double>(x, left);
-      taps.weights.push_back(static_cast<float>(covered / (right - left)));
-    }
-  }
-  return all;
-}
-
-template <class Pixel>
-void ScaleOf(const Picture& from, Picture& to) {
-  const std::vector<Taps> across = TapsOf(from.width(), to.width());
-  const std::vector<Taps> down = TapsOf(from.height(), to.height());
-  // One line of the result at the source's width, colours times alpha.
-  std::vector<HX_PixelFloat> line(static_cast<std::size_t>(from.width()));
-  for (int y = 0; y < to.height(); ++y) {
-    std::fill(line.begin(), line.end(), HX_PixelFloat{});
-    const Taps& rows = down[static_cast<std::size_t>(y)];
-    for (std::size_t k = 0; k < rows.weights.size(); ++k) {
-      const Pixel* row = from.row<Pixel>(rows.first + static_cast<int>(k));
-      for (std::size_t x = 0; x < line.size(); ++x) {
-        const float alpha = rows.weights[k] * (static_cast<float>(row[x].alpha) / kTop<Pixel>);
-        line[x].alpha += alpha;
-        line[x].red += alpha * static_cast<float>(row[x].red);
-        line[x].green += alpha * static_cast<float>(row[x].green);
-        line[x].blue += alpha * static_cast<float>(row[x].blue);
-      }
-    }
-    Pixel* out = to.row<Pixel>(y);
-    for (int x = 0; x < to.width(); ++x) {
-      const Taps& columns = across[static_cast<std::size_t>(x)];
-      HX_PixelFloat sum{};
-      for (std::size_t k = 0; k < columns.weights.size(); ++k) {
-        const HX_PixelFloat& pixel = line[static_cast<std::size_t>(columns.first) + k];
-        sum.alpha += columns.weights[k] * pixel.alpha;
-        sum.red += columns.weights[k] * pixel.red;
-        sum.green += columns.weights[k] * pixel.green;
-        sum.blue += columns.weights[k] * pixel.blue;
-      }
-      const float gain = sum.alpha > 0 ? 1 / (sum.alpha * kTop<Pixel>) : 0;
-      out[x] = FromUnit<Pixel>({sum.alpha, sum.red * gain, sum.green * gain, sum.blue * gain});
-    }
-  }
-}
-
 }  // namespace
-
-std::size_t BytesOf(PixelKind kind) {
-  std::size_t bytes = 0;
-  WithPixel(kind, [&](auto pixel) { bytes = sizeof pixel; });
-  return bytes;
-}
 
 std::uint32_t FormatOf(PixelKind kind) {
   switch (kind) {
@@ -164,7 +62,7 @@ boost::shared_ptr<PicturePool> PicturePool::Make() {
 
 boost::shared_ptr<Picture> PicturePool::NewPicture(PixelKind kind, int width, int height,
                                                    std::ptrdiff_t padding, bool top_down) {
-  const auto row_bytes = static_cast<std::ptrdiff_t>(BytesOf(kind)) * width + padding;
+  const auto row_bytes = std::ptrdiff_t{BytesPerPixel(FormatOf(kind))} * width + padding;
   // Row bytes are 32 bits wide in the host's records.
   if (width < 1 || height < 1 || row_bytes > std::numeric_limits<std::int32_t>::max()) {
     throw std::bad_alloc();
@@ -210,21 +108,28 @@ HX_World WorldOf(const Picture& picture) {
 }
 
 void FillPicture(Picture& picture, const std::function<HX_PixelFloat(int, int)>& colour) {
-  WithPixel(picture.kind(), [&]<class Pixel>(Pixel) {
-    for (int y = 0; y < picture.height(); ++y) {
-      Pixel* row = picture.row<Pixel>(y);
-      for (int x = 0; x < picture.width(); ++x) row[x] = FromUnit<Pixel>(colour(x, y));
-    }
-  });
+  std::vector<HX_PixelFloat> row(static_cast<std::size_t>(picture.width()));
+  for (int y = 0; y < picture.height(); ++y) {
+    for (int x = 0; x < picture.width(); ++x) row[static_cast<std::size_t>(x)] = colour(x, y);
+    StoreRow(FormatOf(picture.kind()), &row[0].alpha, picture.width(), picture.row<void>(y));
+  }
 }
 
 void KeepField(Picture& picture, int parity) {
   if (picture.height() < 2) return;
-  WithPixel(picture.kind(), [&]<class Pixel>(Pixel) { KeepFieldOf<Pixel>(picture, parity); });
+  switch (picture.kind()) {
+    case PixelKind::argb8:
+      return KeepFieldOf<HX_Pixel8>(picture, parity);
+    case PixelKind::argb16:
+      return KeepFieldOf<HX_Pixel16>(picture, parity);
+    case PixelKind::argbf:
+      return KeepFieldOf<HX_PixelFloat>(picture, parity);
+  }
 }
 
 void ScalePicture(const Picture& from, Picture& to) {
-  WithPixel(to.kind(), [&]<class Pixel>(Pixel) { ScaleOf<Pixel>(from, to); });
+  HX_World target = WorldOf(to);
+  CopyWorld(WorldOf(from), target, nullptr, nullptr);
 }
 
 }  // namespace calmframe::host

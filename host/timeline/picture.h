@@ -16,16 +16,8 @@ namespace calmframe::host {
 // The host's three depths; see platform/hx/hx_pixel.h.
 enum class PixelKind { argb8, argb16, argbf };
 
-std::size_t BytesOf(PixelKind kind);     // of one pixel
 std::uint32_t FormatOf(PixelKind kind);  // HX_FORMAT_*
 PixelKind KindOfDepth(int bits);         // 8; 16 above it; float above 16
-
-template <class Pixel>
-inline constexpr PixelKind kKindOf = PixelKind::argbf;
-template <>
-inline constexpr PixelKind kKindOf<HX_Pixel8> = PixelKind::argb8;
-template <>
-inline constexpr PixelKind kKindOf<HX_Pixel16> = PixelKind::argb16;
 
 // One frame's pixels, straight alpha. Written by whoever makes it, constant once it is shared.
 class Picture {
@@ -106,8 +98,7 @@ void FillPicture(Picture& picture, const std::function<HX_PixelFloat(int x, int 
 // and below; at the frame's edge by the nearest. A frame of one line stays as it is.
 void KeepField(Picture& picture, int parity);
 
-// Fills `to` from `from`, of the same kind: each pixel is the mean of the source's area under it,
-// colours weighted by alpha, or, where that is less than a pixel, linear between two.
+// Fills `to` from all of `from`, as CopyWorld does. Both are top-down.
 void ScalePicture(const Picture& from, Picture& to);
 
 }  // namespace calmframe::host

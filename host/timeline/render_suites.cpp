@@ -42,7 +42,7 @@ HX_Frame MakeFrame(Core& core, const FrameRequest& request) noexcept {
 HX_Err RenderAsync(HX_Node node, int64_t time_ticks, int64_t /*rate_ticks*/,
                    const HX_RenderParams* params, HX_RenderCallback callback, void* record,
                    int32_t* request_id) {
-  return Operation("RenderAsync", [=](Core& core) {
+  return Operation("Video Segment Render.RenderAsync", [=](Core& core) {
     return WithHandle(core.nodes, node, [&](const GraphNode& found) {
       const std::optional<FrameRequest> request = RequestOf(found, time_ticks, params);
       if (!request || !callback || !request_id || core.faults.render_refused) {
@@ -65,7 +65,7 @@ HX_Err RenderAsync(HX_Node node, int64_t time_ticks, int64_t /*rate_ticks*/,
 HX_Err MakeIdentifier(HX_Node node, int64_t time_ticks, int64_t /*ticks_per_frame*/,
                       int32_t /*width*/, int32_t /*height*/, int32_t /*par_num*/,
                       int32_t /*par_den*/, const HX_RenderParams* params, HX_String* text) {
-  return Operation("MakeIdentifier", [=](Core& core) {
+  return Operation("Video Segment Render.MakeIdentifier", [=](Core& core) {
     return WithHandle(core.nodes, node, [&](const GraphNode& found) {
       const std::optional<FrameRequest> request = RequestOf(found, time_ticks, params);
       if (!request || !text || core.faults.identifier_failed) return HX_ERR_UNKNOWN;
@@ -76,7 +76,7 @@ HX_Err MakeIdentifier(HX_Node node, int64_t time_ticks, int64_t /*ticks_per_fram
 }
 
 HX_Err Cancel(int32_t request_id) {
-  return GivingBack("Cancel", [=](Core& core) {
+  return GivingBack("Video Segment Render.Cancel", [=](Core& core) {
     core.queue.Cancel(request_id, std::chrono::milliseconds(core.faults.late_callback_ms));
     return true;
   });
@@ -94,35 +94,35 @@ HX_Err Answer(const char* name, HX_Frame frame, Result* result, Read read) {
 }
 
 HX_Err GetPixels(HX_Frame frame, uint8_t** pixels) {
-  return Answer("GetPixels", frame, pixels,
+  return Answer("CutPix.GetPixels", frame, pixels,
                 [](const Picture& picture) { return const_cast<std::uint8_t*>(picture.memory()); });
 }
 
 HX_Err GetRowBytes(HX_Frame frame, int32_t* row_bytes) {
-  return Answer("GetRowBytes", frame, row_bytes, [](const Picture& picture) {
+  return Answer("CutPix.GetRowBytes", frame, row_bytes, [](const Picture& picture) {
     return static_cast<std::int32_t>(picture.row_bytes());
   });
 }
 
 HX_Err GetPixelFormat(HX_Frame frame, uint32_t* format) {
-  return Answer("GetPixelFormat", frame, format, [](const Picture& picture) {
+  return Answer("CutPix.GetPixelFormat", frame, format, [](const Picture& picture) {
     return FormatOf(picture.kind()) | (picture.top_down() ? HX_FORMAT_TOP_DOWN : 0);
   });
 }
 
 HX_Err GetSize(HX_Frame frame, int32_t* width, int32_t* height) {
-  return Answer("GetSize", frame, height ? width : nullptr, [=](const Picture& picture) {
+  return Answer("CutPix.GetSize", frame, height ? width : nullptr, [=](const Picture& picture) {
     *height = picture.height();
     return picture.width();
   });
 }
 
 HX_Err DisposeFrame(HX_Frame frame) {
-  return GivingBack("Dispose", [=](Core& core) { return core.frames.Remove(frame); });
+  return GivingBack("CutPix.Dispose", [=](Core& core) { return core.frames.Remove(frame); });
 }
 
 HX_Err Lookup(const HX_Guid* identifier, HX_Frame* frame) {
-  return Operation("Lookup", [=](Core& core) {
+  return Operation("CutPix Cache.Lookup", [=](Core& core) {
     if (!identifier || !frame) return HX_ERR_UNKNOWN;
     const PicturePtr picture = core.cache.Find(GuidOf(*identifier));
     *frame = picture ? core.frames.Add(picture) : 0;
@@ -131,7 +131,7 @@ HX_Err Lookup(const HX_Guid* identifier, HX_Frame* frame) {
 }
 
 HX_Err Reference(const HX_Guid* identifier) {
-  return Operation("Reference", [=](Core& core) {
+  return Operation("CutPix Cache.Reference", [=](Core& core) {
     if (!identifier) return HX_ERR_UNKNOWN;
     core.cache.Reference(GuidOf(*identifier));
     return HX_ERR_NONE;
@@ -139,7 +139,7 @@ HX_Err Reference(const HX_Guid* identifier) {
 }
 
 HX_Err Dereference(const HX_Guid* identifier) {
-  return GivingBack("Dereference", [=](Core& core) {
+  return GivingBack("CutPix Cache.Dereference", [=](Core& core) {
     if (identifier) core.cache.Dereference(GuidOf(*identifier));
     return identifier != nullptr;
   });

@@ -9,7 +9,7 @@ namespace {
 using Core = MediaCore;
 
 HX_Err MakeFromUTF8(const char* text, HX_String* string) {
-  return Operation("MakeFromUTF8", [=](Core& core) {
+  return Operation("String.MakeFromUTF8", [=](Core& core) {
     if (!text || !string) return HX_ERR_UNKNOWN;
     *string = core.strings.Make(text);
     return HX_ERR_NONE;
@@ -17,7 +17,7 @@ HX_Err MakeFromUTF8(const char* text, HX_String* string) {
 }
 
 HX_Err MakeFromUTF16(const uint16_t* text, HX_String* string) {
-  return Operation("MakeFromUTF16", [=](Core& core) {
+  return Operation("String.MakeFromUTF16", [=](Core& core) {
     if (!text || !string) return HX_ERR_UNKNOWN;
     std::u16string units;
     for (const std::uint16_t* unit = text; *unit != 0; ++unit) {
@@ -29,7 +29,7 @@ HX_Err MakeFromUTF16(const uint16_t* text, HX_String* string) {
 }
 
 HX_Err GetUTF8(HX_String string, const char** text) {
-  return Operation("GetUTF8", [=](Core& core) {
+  return Operation("String.GetUTF8", [=](Core& core) {
     const HX_StringRecord* const found = core.strings.Find(string);
     if (!found || !text) return HX_ERR_UNKNOWN;
     *text = found->utf8.c_str();
@@ -38,7 +38,7 @@ HX_Err GetUTF8(HX_String string, const char** text) {
 }
 
 HX_Err GetUTF16(HX_String string, const uint16_t** text) {
-  return Operation("GetUTF16", [=](Core& core) {
+  return Operation("String.GetUTF16", [=](Core& core) {
     const HX_StringRecord* const found = core.strings.Find(string);
     if (!found || !text) return HX_ERR_UNKNOWN;
     *text = found->utf16.data();
@@ -47,11 +47,11 @@ HX_Err GetUTF16(HX_String string, const uint16_t** text) {
 }
 
 HX_Err Dispose(HX_String string) {
-  return GivingBack("Dispose", [=](Core& core) { return core.strings.Dispose(string); });
+  return GivingBack("String.Dispose", [=](Core& core) { return core.strings.Dispose(string); });
 }
 
 HX_Err GetFileName(HX_String path, HX_String* name) {
-  return Operation("GetFileName", [=](Core& core) {
+  return Operation("String.GetFileName", [=](Core& core) {
     const HX_StringRecord* const found = core.strings.Find(path);
     if (!found || !name) return HX_ERR_UNKNOWN;
     *name = core.strings.Make(found->utf8.substr(found->utf8.rfind('/') + 1));
