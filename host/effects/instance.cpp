@@ -4,6 +4,7 @@
 #include <utility>
 #include <vector>
 
+#include "host/base/operations.h"
 #include "host/effects/host.h"
 #include "host/effects/layer_time.h"
 
@@ -85,6 +86,13 @@ CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World
   }
   if (!result.message.empty()) effect_->AddMessage(result.message);
   return result;
+}
+
+void Instance::Destroy(const Place& place) {
+  for (int tries = 0; tries < 2; ++tries) {
+    if (Call(HX_CMD_DESTROY_INSTANCE, place).ok() || !handle_) break;
+  }
+  if (handle_) Ledger::Get().Mistake("DestroyInstance: the handle is still there");
 }
 
 }  // namespace calmframe::host

@@ -54,6 +54,10 @@ class Instance {
   CommandResult Call(std::uint32_t command, const Place& place, HX_World* output = nullptr,
                      void* extra = nullptr, HX_OutData* out = nullptr);
 
+  // Takes the instance apart; tried a second time when the plug-in fails and keeps the handle. One
+  // that is kept still is a mistake in the Ledger.
+  void Destroy(const Place& place);
+
   // Of the call that is under way, for the interface's functions; null outside.
   RenderContext* frames() const { return frames_; }
 

@@ -66,17 +66,15 @@ PicturePtr RenderContext::Fetch(std::int64_t media_ticks) {
 }
 
 const HX_World* RenderContext::CheckOutInput(std::int64_t media_ticks) {
-  PicturePtr picture = Fetch(media_ticks);
+  const PicturePtr picture = Fetch(media_ticks);
   if (!picture) return nullptr;
-  const auto same = std::find_if(inputs_.begin(), inputs_.end(),
-                                 [&](const Held& input) { return input.picture == picture; });
-  Held& held = same != inputs_.end() ? *same : inputs_.emplace_back();
-  if (same == inputs_.end()) {
-    held.world = WorldOf(*picture);
-    held.picture = std::move(picture);
+  auto held = std::find_if(inputs_.begin(), inputs_.end(),
+                           [&](const Held& input) { return input.picture == picture; });
+  if (held == inputs_.end()) {
+    held = inputs_.insert(inputs_.end(), Held{picture, WorldOf(*picture), 0});
   }
-  ++held.uses;
-  return &held.world;
+  ++held->uses;
+  return &held->world;
 }
 
 void RenderContext::CheckInInput(const void* pixels) {

@@ -1,9 +1,9 @@
 #pragma once
 
 #include <cstdint>
+#include <list>
 #include <map>
 #include <memory>
-#include <vector>
 
 #include "host/pixels/world_buffer.h"
 #include "host/timeline/media_services.h"
@@ -29,7 +29,8 @@ class RenderContext {
   int width() const { return width_; }  // of the layer at this scale, rounded up
   int height() const { return height_; }
 
-  // The layer's frame at a media time, held until it is checked in. Null when there is none.
+  // The layer's frame at a media time, held, as is its record, until it is checked in. Null when
+  // there is none.
   const HX_World* CheckOutInput(std::int64_t media_ticks);
   void CheckInInput(const void* pixels);
 
@@ -64,7 +65,7 @@ class RenderContext {
   const HX_Ratio downsample_x_, downsample_y_;
   std::int64_t ticks_per_frame_, frame_count_;
   int width_, height_;
-  std::vector<Held> inputs_;
+  std::list<Held> inputs_;
   std::map<std::int32_t, Ordered> ordered_;
   std::shared_ptr<WorldBuffer> output_;
 };

@@ -35,8 +35,8 @@ std::shared_ptr<WorldBuffer> OutputFor(Host& host, const HX_Rect& rect, int bit_
   return output;
 }
 
-void CheckPadding(const std::shared_ptr<WorldBuffer>& output, const Host& host) {
-  if (output && const_cast<Host&>(host).worlds().row_padding() > 0 && !output->PaddingIntact()) {
+void CheckPadding(const std::shared_ptr<WorldBuffer>& output, Host& host) {
+  if (host.worlds().row_padding() > 0 && !output->PaddingIntact()) {
     Ledger::Get().Mistake("output: written behind its rows");
   }
 }
@@ -68,7 +68,7 @@ Renderer::Renderer(Host& host, std::shared_ptr<TimelineEffect> effect)
 }
 
 Renderer::~Renderer() {
-  instance_->Call(HX_CMD_DESTROY_INSTANCE, {});
+  instance_->Destroy({});
 }
 
 RenderedFrame Renderer::Direct(const RenderRequest& request) {
