@@ -17,7 +17,7 @@ constexpr std::size_t kFormatSize = 512;  // of the callers' buffers
 HX_Err CheckoutInput(Instance& instance, std::int32_t time, std::uint32_t time_scale,
                      HX_ParamDef& param) {
   if (!instance.frames() || time_scale == 0) return HX_ERR_UNKNOWN;
-  const LayerTime layer(*instance.effect()->layer()->state());
+  const LayerTime layer(instance.frames()->layer());
   const HX_World* world = instance.frames()->CheckOutInput(layer.MediaTicks(time, time_scale));
   if (!world) return HX_ERR_UNKNOWN;
   param = {};
@@ -32,7 +32,7 @@ HX_Err CheckoutParam(HX_EffectRef effect, std::int32_t index, std::int32_t time,
     if (index == 0) {
       if (const HX_Err code = CheckoutInput(instance, time, time_scale, *param)) return code;
     } else {
-      const std::optional<HX_ParamDef> found = instance.effect()->params().At(index);
+      const std::optional<HX_ParamDef> found = instance.Param(index);
       if (!found) return HX_ERR_UNKNOWN;
       *param = *found;
     }

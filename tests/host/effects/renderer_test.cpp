@@ -154,7 +154,7 @@ TEST_F(RendererTest, RenderersWorkAtOnceWhileTheEffectTicksAndSaves) {
         const RenderedFrame rendered =
             i % 2 ? renderer->Direct({frame}) : renderer->Planned({frame, 8, {1, 2}});
         EXPECT_TRUE(rendered.pixels);
-        EXPECT_EQ(At(*rendered.pixels, 2, 2)[0], frame * 20);
+        EXPECT_EQ(At(*rendered.OnLayer(), 2, 2)[0], frame * 20);
       }
     });
   }
