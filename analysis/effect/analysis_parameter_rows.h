@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "stabilizer/effect/src/parameter_row.h"
+#include "effect/parameter_row.h"
 
 // The parameters of every effect that analyses its input. Such an effect decides where they stand
 // among its own, so here they go by ids of their own.

@@ -1,4 +1,4 @@
-#include "stabilizer/effect/src/analysis_parameter_rows.h"
+#include "analysis/effect/analysis_parameter_rows.h"
 
 #include <iterator>
 

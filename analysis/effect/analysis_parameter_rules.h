@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "stabilizer/effect/src/parameter_reader.h"
+#include "effect/parameter_reader.h"
 #include "tracking/selector_params.h"
 #include "tracking/tracker_params.h"
 

@@ -1,4 +1,4 @@
-#include "stabilizer/effect/src/analysis_strings.h"
+#include "analysis/effect/analysis_strings.h"
 
 namespace kelp::analysis::effect {
 

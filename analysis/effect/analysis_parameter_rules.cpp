@@ -1,9 +1,9 @@
-#include "stabilizer/effect/src/analysis_parameter_rules.h"
+#include "analysis/effect/analysis_parameter_rules.h"
 
 #include <algorithm>
 #include <cmath>
 
-#include "stabilizer/effect/src/analysis_parameter_rows.h"
+#include "analysis/effect/analysis_parameter_rows.h"
 
 namespace kelp::analysis::effect {
 

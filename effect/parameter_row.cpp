@@ -1,4 +1,4 @@
-#include "stabilizer/effect/src/parameter_row.h"
+#include "effect/parameter_row.h"
 
 #include <algorithm>
 #include <cstring>
