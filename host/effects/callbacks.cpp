@@ -17,7 +17,7 @@ constexpr std::size_t kFormatSize = 512;  // of the callers' buffers
 HX_Err CheckoutInput(Instance& instance, std::int32_t time, std::uint32_t time_scale,
                      HX_ParamDef& param) {
   if (!instance.frames() || time_scale == 0) return HX_ERR_UNKNOWN;
-  const LayerTime layer(*instance.effect()->layer()->state());
+  const LayerTime layer(instance.frames()->layer());
   const HX_World* world = instance.frames()->CheckOutInput(layer.MediaTicks(time, time_scale));
   if (!world) return HX_ERR_UNKNOWN;
   param = {};
@@ -32,7 +32,7 @@ HX_Err CheckoutParam(HX_EffectRef effect, std::int32_t index, std::int32_t time,
     if (index == 0) {
       if (const HX_Err code = CheckoutInput(instance, time, time_scale, *param)) return code;
     } else {
-      const std::optional<HX_ParamDef> found = instance.effect()->params().At(index);
+      const std::optional<HX_ParamDef> found = instance.Param(index);
       if (!found) return HX_ERR_UNKNOWN;
       *param = *found;
     }
@@ -145,16 +145,16 @@ HX_Err TransferCallback(HX_EffectRef, const HX_World* from, const HX_TransferMod
   });
 }
 
-// Begin and end of a direct render; the table's rows mean nothing to this host.
-HX_Err Utility(HX_EffectRef effect, std::int32_t operation, const void* table) {
-  return WithInstance("utility", effect, [&](Host& host, Instance&) -> HX_Err {
-    if (operation == HX_UTILITY_BEGIN_RENDER && table) {
-      host.CountDirectRender(1);
-    } else if (operation == HX_UTILITY_END_RENDER) {
-      host.CountDirectRender(-1);
-    } else {
-      return HX_ERR_UNKNOWN;
-    }
+// Begin and end of a direct render; the table's rows mean nothing to this host. An end that is made
+// to fail has ended the render all the same.
+HX_Err Utility(HX_EffectRef, std::int32_t operation, const void* table) {
+  if (operation == HX_UTILITY_END_RENDER) {
+    if (Host* host = Host::active()) host->CountDirectRender(-1);
+  }
+  return WithHost("utility", [&](Host& host) -> HX_Err {
+    if (operation == HX_UTILITY_END_RENDER) return HX_ERR_NONE;
+    if (operation != HX_UTILITY_BEGIN_RENDER || !table) return HX_ERR_UNKNOWN;
+    host.CountDirectRender(1);
     return HX_ERR_NONE;
   });
 }

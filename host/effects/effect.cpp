@@ -38,7 +38,7 @@ Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position,
 
 Effect::~Effect() {
   const Host::LoopCall on_loop;
-  instance_->Call(HX_CMD_DESTROY_INSTANCE, {playhead_});
+  instance_->Destroy({playhead_});
   standing_.reset();
   shared_->layer()->RemoveEffect(shared_->runtime_id());
 }

@@ -4,6 +4,7 @@
 #include <utility>
 #include <vector>
 
+#include "host/base/operations.h"
 #include "host/effects/host.h"
 #include "host/effects/layer_time.h"
 
@@ -33,15 +34,14 @@ Instance::~Instance() {
 
 CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World* output,
                              void* extra, HX_OutData* out) {
-  const boost::shared_ptr<const LayerState> layer = effect_->layer()->state();
-  const SourceInfo& source = layer->source->info();
-  const LayerTime time(*layer);
-
   std::optional<RenderContext> own;
   RenderContext* frames = place.frames;
   if (!frames) {
-    frames = &own.emplace(host_.media(), ref_, *layer, 8, HX_Ratio{1, 1}, HX_Ratio{1, 1});
+    frames = &own.emplace(host_.media(), ref_, effect_->layer()->state(), 8, HX_Ratio{1, 1},
+                          HX_Ratio{1, 1});
   }
+  const SourceInfo& source = frames->layer().source->info();
+  const LayerTime time(frames->layer());
 
   HX_InData in{};
   in.effect_ref = ref_;
@@ -56,7 +56,8 @@ CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World
   in.downsample_x = frames->downsample_x();
   in.downsample_y = frames->downsample_y();
 
-  std::vector<HX_ParamDef> params = effect_->params().All();
+  std::vector<HX_ParamDef> params =
+      frames->frozen_params().empty() ? effect_->params().All() : frames->frozen_params();
   HX_World& input = params[0].u.ld;
   if (place.input) {
     input = *place.input;
@@ -85,6 +86,20 @@ CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World
   }
   if (!result.message.empty()) effect_->AddMessage(result.message);
   return result;
+}
+
+std::optional<HX_ParamDef> Instance::Param(std::int32_t index) const {
+  if (!frames_ || frames_->frozen_params().empty()) return effect_->params().At(index);
+  const std::vector<HX_ParamDef>& params = frames_->frozen_params();
+  if (index < 0 || static_cast<std::size_t>(index) >= params.size()) return std::nullopt;
+  return params[static_cast<std::size_t>(index)];
+}
+
+void Instance::Destroy(const Place& place) {
+  for (int tries = 0; tries < 2; ++tries) {
+    if (Call(HX_CMD_DESTROY_INSTANCE, place).ok() || !handle_) break;
+  }
+  if (handle_) Ledger::Get().Mistake("DestroyInstance: the handle is still there");
 }
 
 }  // namespace calmframe::host

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "host/effects/render_context.h"
@@ -47,13 +48,19 @@ class Instance {
     HX_World* input = nullptr;        // of params[0]; null: its size alone
   };
 
-  // Runs the command with the records preset, all parameters in place, the handles taken back and
-  // the message kept, whatever the result. `out`, if given, holds the presets that the command
-  // needs and then what it answered. Values that the plug-in replaced in its parameters, by
-  // change_flag, are taken over.
+  // Runs the command with the records preset, all parameters in place (those that `frames` froze,
+  // if it did), the handles taken back and the message kept, whatever the result. `out`, if given,
+  // holds the presets that the command needs and then what it answered. Values that the plug-in
+  // replaced in its parameters, by change_flag, are taken over.
   CommandResult Call(std::uint32_t command, const Place& place, HX_World* output = nullptr,
                      void* extra = nullptr, HX_OutData* out = nullptr);
 
+  // Takes the instance apart; tried a second time when the plug-in fails and keeps the handle. One
+  // that is kept still is a mistake in the Ledger.
+  void Destroy(const Place& place);
+
+  // As the call that is under way sees it, for the interface's functions; none outside the table.
+  std::optional<HX_ParamDef> Param(std::int32_t index) const;
   // Of the call that is under way, for the interface's functions; null outside.
   RenderContext* frames() const { return frames_; }
 

@@ -5,29 +5,27 @@
 namespace calmframe::host {
 namespace {
 
-// body(frames, instance); an error outside of a render.
+// body(frames); an error outside of a render.
 template <typename Body>
 HX_Err WithFrames(const char* operation, HX_EffectRef effect, Body body) noexcept {
   return WithInstance(operation, effect, [&](Host&, Instance& instance) -> HX_Err {
-    return instance.frames() ? body(*instance.frames(), instance) : HX_ERR_UNKNOWN;
+    return instance.frames() ? body(*instance.frames()) : HX_ERR_UNKNOWN;
   });
 }
 
 HX_Err CheckoutLayer(HX_EffectRef effect, std::int32_t index, std::int32_t id,
                      const HX_RenderRequest* request, std::int32_t time, std::int32_t,
                      std::uint32_t time_scale, HX_CheckoutResult* result) {
-  return WithFrames(
-      "plan.checkout_layer", effect, [&](RenderContext& frames, Instance& instance) -> HX_Err {
-        if (index != 0 || time_scale == 0) return HX_ERR_UNKNOWN;
-        const LayerTime layer(*instance.effect()->layer()->state());
-        return frames.Order(id, request->rect, layer.MediaTicks(time, time_scale), result);
-      });
+  return WithFrames("plan.checkout_layer", effect, [&](RenderContext& frames) -> HX_Err {
+    if (index != 0 || time_scale == 0) return HX_ERR_UNKNOWN;
+    const LayerTime layer(frames.layer());
+    return frames.Order(id, request->rect, layer.MediaTicks(time, time_scale), result);
+  });
 }
 
 HX_Err CheckoutLayerPixels(HX_EffectRef effect, std::int32_t id, HX_World** world) {
-  return WithFrames("render.checkout_layer_pixels", effect, [&](RenderContext& frames, Instance&) {
-    return frames.CheckOutOrdered(id, world);
-  });
+  return WithFrames("render.checkout_layer_pixels", effect,
+                    [&](RenderContext& frames) { return frames.CheckOutOrdered(id, world); });
 }
 
 // Not to be failed, as every giving back.
@@ -38,12 +36,11 @@ HX_Err CheckinLayerPixels(HX_EffectRef effect, std::int32_t id) {
 }
 
 HX_Err CheckoutOutput(HX_EffectRef effect, HX_World** world) {
-  return WithFrames("render.checkout_output", effect,
-                    [&](RenderContext& frames, Instance&) -> HX_Err {
-                      if (!frames.output()) return HX_ERR_UNKNOWN;
-                      *world = &frames.output()->world();
-                      return HX_ERR_NONE;
-                    });
+  return WithFrames("render.checkout_output", effect, [&](RenderContext& frames) -> HX_Err {
+    if (!frames.output()) return HX_ERR_UNKNOWN;
+    *world = &frames.output()->world();
+    return HX_ERR_NONE;
+  });
 }
 
 }  // namespace

@@ -28,17 +28,17 @@ HX_World PartOf(HX_World world, const HX_Rect& rect) {
 
 }  // namespace
 
-RenderContext::RenderContext(MediaServices& media, HX_EffectRef effect, const LayerState& layer,
-                             int bit_depth, HX_Ratio downsample_x, HX_Ratio downsample_y)
+RenderContext::RenderContext(MediaServices& media, HX_EffectRef effect,
+                             boost::shared_ptr<const LayerState> layer, int bit_depth,
+                             HX_Ratio downsample_x, HX_Ratio downsample_y)
     : media_(media),
       effect_(effect),
+      layer_(std::move(layer)),
       bit_depth_(bit_depth),
       downsample_x_(downsample_x),
       downsample_y_(downsample_y),
-      ticks_per_frame_(std::max<std::int64_t>(layer.ticks_per_frame, 1)),
-      frame_count_(layer.source->info().frame_count),
-      width_(Scaled(layer.source->info().width, downsample_x)),
-      height_(Scaled(layer.source->info().height, downsample_y)) {}
+      width_(Scaled(layer_->source->info().width, downsample_x)),
+      height_(Scaled(layer_->source->info().height, downsample_y)) {}
 
 RenderContext::~RenderContext() {
   for (const Held& input : inputs_) {
@@ -52,7 +52,8 @@ RenderContext::~RenderContext() {
 }
 
 bool RenderContext::HasFrame(std::int64_t media_ticks) const {
-  return media_ticks >= 0 && media_ticks / ticks_per_frame_ < frame_count_;
+  return media_ticks >= 0 && media_ticks / std::max<std::int64_t>(layer_->ticks_per_frame, 1) <
+                                 layer_->source->info().frame_count;
 }
 
 PicturePtr RenderContext::Fetch(std::int64_t media_ticks) {
@@ -66,17 +67,15 @@ PicturePtr RenderContext::Fetch(std::int64_t media_ticks) {
 }
 
 const HX_World* RenderContext::CheckOutInput(std::int64_t media_ticks) {
-  PicturePtr picture = Fetch(media_ticks);
+  const PicturePtr picture = Fetch(media_ticks);
   if (!picture) return nullptr;
-  const auto same = std::find_if(inputs_.begin(), inputs_.end(),
-                                 [&](const Held& input) { return input.picture == picture; });
-  Held& held = same != inputs_.end() ? *same : inputs_.emplace_back();
-  if (same == inputs_.end()) {
-    held.world = WorldOf(*picture);
-    held.picture = std::move(picture);
+  auto held = std::find_if(inputs_.begin(), inputs_.end(),
+                           [&](const Held& input) { return input.picture == picture; });
+  if (held == inputs_.end()) {
+    held = inputs_.insert(inputs_.end(), Held{picture, WorldOf(*picture), 0});
   }
-  ++held.uses;
-  return &held.world;
+  ++held->uses;
+  return &held->world;
 }
 
 void RenderContext::CheckInInput(const void* pixels) {

@@ -1,8 +1,11 @@
 #pragma once
 
+#include <boost/shared_ptr.hpp>
 #include <cstdint>
+#include <list>
 #include <map>
 #include <memory>
+#include <utility>
 #include <vector>
 
 #include "host/pixels/world_buffer.h"
@@ -16,20 +19,28 @@ namespace calmframe::host {
 class RenderContext {
  public:
   // `effect` is attached to the media services. Downsample ratios are above 0, at most 1.
-  RenderContext(MediaServices& media, HX_EffectRef effect, const LayerState& layer, int bit_depth,
-                HX_Ratio downsample_x, HX_Ratio downsample_y);
+  RenderContext(MediaServices& media, HX_EffectRef effect,
+                boost::shared_ptr<const LayerState> layer, int bit_depth, HX_Ratio downsample_x,
+                HX_Ratio downsample_y);
   // What the call did not check in is a mistake in the Ledger.
   ~RenderContext();
   RenderContext(const RenderContext&) = delete;
   RenderContext& operator=(const RenderContext&) = delete;
 
+  // From now on the effect sees these parameters, whatever the user does: both commands of a render
+  // go by one decision.
+  void FreezeParams(std::vector<HX_ParamDef> params) { params_ = std::move(params); }
+  const std::vector<HX_ParamDef>& frozen_params() const { return params_; }  // empty: none
+
+  const LayerState& layer() const { return *layer_; }
   int bit_depth() const { return bit_depth_; }
   HX_Ratio downsample_x() const { return downsample_x_; }
   HX_Ratio downsample_y() const { return downsample_y_; }
   int width() const { return width_; }  // of the layer at this scale, rounded up
   int height() const { return height_; }
 
-  // The layer's frame at a media time, held until it is checked in. Null when there is none.
+  // The layer's frame at a media time, held, as is its record, until it is checked in. Null when
+  // there is none.
   const HX_World* CheckOutInput(std::int64_t media_ticks);
   void CheckInInput(const void* pixels);
 
@@ -60,11 +71,12 @@ class RenderContext {
 
   MediaServices& media_;
   const HX_EffectRef effect_;
+  const boost::shared_ptr<const LayerState> layer_;
   const int bit_depth_;
   const HX_Ratio downsample_x_, downsample_y_;
-  std::int64_t ticks_per_frame_, frame_count_;
   int width_, height_;
-  std::vector<Held> inputs_;
+  std::vector<HX_ParamDef> params_;
+  std::list<Held> inputs_;
   std::map<std::int32_t, Ordered> ordered_;
   std::shared_ptr<WorldBuffer> output_;
 };

@@ -35,8 +35,8 @@ std::shared_ptr<WorldBuffer> OutputFor(Host& host, const HX_Rect& rect, int bit_
   return output;
 }
 
-void CheckPadding(const std::shared_ptr<WorldBuffer>& output, const Host& host) {
-  if (output && const_cast<Host&>(host).worlds().row_padding() > 0 && !output->PaddingIntact()) {
+void CheckPadding(const std::shared_ptr<WorldBuffer>& output, Host& host) {
+  if (host.worlds().row_padding() > 0 && !output->PaddingIntact()) {
     Ledger::Get().Mistake("output: written behind its rows");
   }
 }
@@ -68,7 +68,7 @@ Renderer::Renderer(Host& host, std::shared_ptr<TimelineEffect> effect)
 }
 
 Renderer::~Renderer() {
-  instance_->Call(HX_CMD_DESTROY_INSTANCE, {});
+  instance_->Destroy({});
 }
 
 RenderedFrame Renderer::Direct(const RenderRequest& request) {
@@ -78,13 +78,13 @@ RenderedFrame Renderer::Direct(const RenderRequest& request) {
     rendered.result.code = kBadRequest;
     return rendered;
   }
-  const boost::shared_ptr<const LayerState> layer = instance_->effect()->layer()->state();
-  RenderContext frames(host_.media(), instance_->ref(), *layer, request.bit_depth,
-                       request.downsample, request.downsample);
+  RenderContext frames(host_.media(), instance_->ref(), instance_->effect()->layer()->state(),
+                       request.bit_depth, request.downsample, request.downsample);
+  frames.FreezeParams(instance_->effect()->params().All());
   rendered.layer_width = frames.width();
   rendered.layer_height = frames.height();
 
-  const LayerTime time(*layer);
+  const LayerTime time(frames.layer());
   const HX_World* input =
       frames.CheckOutInput(time.MediaTicks(time.OfFrame(request.frame), time.scale()));
   // Where the media has no frame the layer is clear.
@@ -125,8 +125,9 @@ RenderedFrame Renderer::Planned(const RenderRequest& request) {
     rendered.result.code = kBadRequest;
     return rendered;
   }
-  RenderContext frames(host_.media(), instance_->ref(), *instance_->effect()->layer()->state(),
+  RenderContext frames(host_.media(), instance_->ref(), instance_->effect()->layer()->state(),
                        request.bit_depth, request.downsample, request.downsample);
+  frames.FreezeParams(instance_->effect()->params().All());
   rendered.layer_width = frames.width();
   rendered.layer_height = frames.height();
   const Instance::Place place{request.frame, &frames, nullptr};

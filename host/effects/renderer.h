@@ -14,7 +14,7 @@ struct RenderRequest {
   int bit_depth = 8;       // 8 or 16; 32 on the planned path alone
   HX_Ratio downsample{1, 1};
   // Part of the frame that is wanted, in layer coordinates at render scale; none: the whole.
-  std::optional<HX_Rect> part;
+  std::optional<HX_Rect> part = {};
 };
 
 struct RenderedFrame {
