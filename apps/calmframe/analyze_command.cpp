@@ -15,8 +15,8 @@ constexpr std::int32_t kAutoScaleGroup = 17;  // disk id; its name tells the sca
 }  // namespace
 
 AnalyzeCommand::AnalyzeCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "analyze", "Tell what would become of a clip, without rendering it")) {
+    : command_(program.add_subcommand("analyze",
+                                      "Tell what would become of a clip, without rendering it")) {
   command_->add_option("IN", input_, "The shaky clip")->required();
   AddControlFlags(*command_, controls_);
   AddRunFlags(*command_, run_);

@@ -110,9 +110,9 @@ const HX_ParamDef& FindParam(const std::string& name, const std::vector<HX_Param
     names.push_back(param.name);
   }
   const std::string nearest = NearestMatch(name, names);
-  throw UsageFailure("--param: there is no parameter '" + name + "'" +
-                     (nearest.empty() ? "; calmframe params lists them"
-                                      : "; did you mean '" + nearest + "'?"));
+  throw UsageFailure(
+      "--param: there is no parameter '" + name + "'" +
+      (nearest.empty() ? "; calmframe params lists them" : "; did you mean '" + nearest + "'?"));
 }
 
 double ParseValue(const HX_ParamDef& param, const std::string& text) {

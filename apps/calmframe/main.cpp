@@ -90,7 +90,8 @@ int Run(int argc, char** argv) {
   } catch (const Interrupted&) {
     return Fail(kInterrupted, "interrupted; nothing was written", json);
   } catch (const media::Failure& failure) {
-    return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what(), json);
+    return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what(),
+                json);
   } catch (const SolveFailure& failure) {
     return Fail(kSolveFailed, failure.what(), json);
   } catch (const std::bad_alloc&) {

@@ -49,7 +49,8 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
   command.add_option("--codec", flags.encode.codec, "Encoder, or the name of what it encodes")
       ->type_name("NAME")
       ->group("Output");
-  command.add_option("--crf", flags.encode.crf, "Quality of the encoder: less is better and larger")
+  command
+      .add_option("--crf", flags.encode.crf, "Quality of the encoder: less is better and larger")
       ->check(CLI::Range(0, 63))
       ->capture_default_str()
       ->group("Output");

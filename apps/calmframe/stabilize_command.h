@@ -16,8 +16,9 @@ struct RunFlags {
   bool json = false;
 
   ProgressLine::Form progress_form() const {
-    return json ? ProgressLine::Form::json
-                : quiet ? ProgressLine::Form::none : ProgressLine::Form::line;
+    return json    ? ProgressLine::Form::json
+           : quiet ? ProgressLine::Form::none
+                   : ProgressLine::Form::line;
   }
 };
 void AddRunFlags(CLI::App& command, RunFlags& flags);

@@ -124,8 +124,9 @@ std::unique_ptr<CropWindow> SteadyClip::Crop() {
   constexpr std::int32_t kUntouched = -1;
   std::int32_t frames, first, columns, rows, width = kUntouched, height = kUntouched, w, h;
   float left, top, right, bottom;
-  if (!get || !get(block, &frames, &first, &columns, &rows, &width, &height, &left, &top, &right,
-                   &bottom, &w, &h) ||
+  if (!get ||
+      !get(block, &frames, &first, &columns, &rows, &width, &height, &left, &top, &right, &bottom,
+           &w, &h) ||
       width == kUntouched) {
     return nullptr;
   }
