@@ -35,10 +35,22 @@ std::shared_ptr<WorldBuffer> OutputFor(Host& host, const HX_Rect& rect, int bit_
   return output;
 }
 
-void CheckPadding(const std::shared_ptr<WorldBuffer>& output, Host& host) {
-  if (host.worlds().row_padding() > 0 && !output->PaddingIntact()) {
+void CheckPadding(const WorldBuffer& output, Host& host) {
+  if (host.worlds().row_padding() > 0 && !output.PaddingIntact()) {
     Ledger::Get().Mistake("output: written behind its rows");
   }
+}
+
+// A copy of what lies inside the rectangle; null when that is nothing.
+std::shared_ptr<WorldBuffer> PartOf(Host& host, const std::shared_ptr<WorldBuffer>& output,
+                                    const HX_Rect& rect, int bit_depth) {
+  const HX_Rect whole = output->rect();
+  auto part = OutputFor(host, Intersect(whole, rect), bit_depth);
+  if (!part) return nullptr;
+  const HX_Rect place = {whole.left - part->rect().left, whole.top - part->rect().top,
+                         whole.right - part->rect().left, whole.bottom - part->rect().top};
+  CopyWorld(output->world(), part->world(), nullptr, &place);
+  return part;
 }
 
 bool IsAbsurd(const HX_Rect& rect) {
@@ -104,14 +116,15 @@ RenderedFrame Renderer::Direct(const RenderRequest& request) {
     rendered.full_rect = {static_cast<std::int32_t>(left), static_cast<std::int32_t>(top),
                           static_cast<std::int32_t>(left + setup.width),
                           static_cast<std::int32_t>(top + setup.height)};
-    const HX_Rect wanted =
-        request.part ? Intersect(rendered.full_rect, *request.part) : rendered.full_rect;
     if (IsAbsurd(rendered.full_rect)) {
       rendered.result.code = kBadRequest;
-    } else if (const auto output = OutputFor(host_, wanted, request.bit_depth)) {
+    } else if (auto output = OutputFor(host_, rendered.full_rect, request.bit_depth)) {
       rendered.result = instance_->Call(HX_CMD_RENDER_FRAME, place, &output->world());
-      CheckPadding(output, host_);
-      if (rendered.result.ok()) rendered.pixels = output;
+      CheckPadding(*output, host_);
+      if (rendered.result.ok()) {
+        rendered.pixels =
+            request.part ? PartOf(host_, output, *request.part, request.bit_depth) : output;
+      }
     }
   }
   if (input) frames.CheckInInput(input->data);
@@ -152,7 +165,7 @@ RenderedFrame Renderer::Planned(const RenderRequest& request) {
   render.request = plan.request;
   SetRenderFunctions(render);
   rendered.result = instance_->Call(HX_CMD_RENDER_PLANNED_FRAME, place, nullptr, &render);
-  CheckPadding(frames.output(), host_);
+  CheckPadding(*frames.output(), host_);
   if (rendered.result.ok()) rendered.pixels = frames.output();
   return rendered;
 }

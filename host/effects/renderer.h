@@ -44,7 +44,8 @@ class Renderer {
 
   const CommandResult& result() const { return result_; }
 
-  // Prepare and render: the effect tells the size of its output and gets its input.
+  // Prepare and render: the effect tells the size of its output and gets its input. It draws the
+  // whole of it, since it has no way to tell whether it can draw a part alone.
   RenderedFrame Direct(const RenderRequest& request);
   // Plan and render: the effect orders the frames it needs.
   RenderedFrame Planned(const RenderRequest& request);
