@@ -26,9 +26,11 @@ TEST_F(AnalysisServiceTest, AnAppliedEffectAnalysesItsClipByItself) {
   EXPECT_EQ(Counter(), 104);
   EXPECT_FALSE(State()->source_identity.IsNil());
   EXPECT_TRUE(State()->first_analysis);
+  const std::uint64_t started = State()->progress.start_tick;
   renderer_->WaitForHeld(2);
   EXPECT_EQ(Tick(), 0);
   EXPECT_EQ(State()->analyzer->job_stage(), JobStage::SeenRunning);
+  EXPECT_GT(State()->progress.start_tick, started);  // the time left counts from here
   EXPECT_EQ(Label(), "0% (frame 1 of 4)");
   EXPECT_FALSE(Enabled(kAnalyzeAt));
   EXPECT_TRUE(Enabled(kCancelAt));
