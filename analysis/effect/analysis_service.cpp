@@ -156,7 +156,10 @@ void AnalysisEffect::PollAnalysis(AnalysisState& state) {
   const JobState job = analyzer->GetStatus().state;
   const bool failed_with_text =
       analyzer->ReportFailure(context().in, context().out) && !analyzer->GetErrorText().empty();
-  if (job == JobState::Running) analyzer->set_job_stage(JobStage::SeenRunning);
+  if (job == JobState::Running && analyzer->job_stage() != JobStage::SeenRunning) {
+    analyzer->set_job_stage(JobStage::SeenRunning);
+    state.progress.start_tick = HighPrecisionTime::Now();
+  }
   if (job <= JobState::Running) {
     RefreshParams();
   } else if (analyzer->job_stage() == JobStage::SeenRunning) {
