@@ -1,3 +1,6 @@
+#include <string>
+#include <vector>
+
 #include "tests/host/tour/played_plugin.h"
 
 // The real plug-in, played by the host as any plug-in is.
@@ -250,6 +253,28 @@ TEST_F(Tour, EffectsOnOneClipShareAnAnalysis) {
   const ShakyClip c{160, 120, 40, "c"}, d{160, 120, 40, "d"};
   EXPECT_LT(requests({MakeLayer(c), MakeLayer(c)}), one * 3 / 2);
   EXPECT_GE(requests({MakeLayer(b), MakeLayer(d)}), one * 2);
+}
+
+// Nothing is written, started or drawn while nothing changes: parameters are read, and the layer's
+// identity.
+TEST_F(Tour, AtRestATickOnlyReads) {
+  Effect& effect = session().Apply(MakeLayer());
+  ASSERT_EQ(Settle(effect), 8);
+  session().Tick();
+  const std::uint64_t generation = effect.shared()->generation();
+  Operations::Get().Record(true);
+  session().Tick();
+  Operations::Get().Record(false);
+  const std::vector<std::string> names = Operations::Get().recorded();
+  EXPECT_LT(names.size(), 100u);
+  for (const std::string& name : names) {
+    const bool reads = name == "checkout_param" || name == "lock_handle" ||
+                       name == "Analysis Host.GetRefusal" || name.rfind("acquire ", 0) == 0 ||
+                       name.rfind("Utility.", 0) == 0 || name.rfind("String.", 0) == 0 ||
+                       name.rfind("Sequence Info.", 0) == 0 || name.rfind("Video Segment.", 0) == 0;
+    EXPECT_TRUE(reads) << name;
+  }
+  EXPECT_EQ(effect.shared()->generation(), generation);
 }
 
 TEST_F(Tour, SavedAndLoadedItGoesOn) {
