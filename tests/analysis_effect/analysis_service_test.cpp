@@ -1,5 +1,8 @@
 #include <gmock/gmock.h>
 
+#include <filesystem>
+
+#include "platform/tesselui/save_dialog.h"
 #include "tests/analysis_effect/test_effect.h"
 
 namespace kelp::analysis::effect {
@@ -183,6 +186,26 @@ TEST_F(AnalysisServiceTest, AQuietTickReadsItsParameterAndNothingElse) {
         << operation.name;
   }
   EXPECT_EQ(reads, 1);
+}
+
+TEST_F(AnalysisServiceTest, TheSaveButtonWritesTheTracksWhereTheUserSays) {
+  const std::string path = ::testing::TempDir() + "analysis_service_test.trk";
+  std::filesystem::remove(path);
+  tesselui::InstallSaveDialog([&](const tesselui::SaveDialogRequest& request) {
+    EXPECT_EQ(request.filter, "TRK Files (*.trk)");
+    EXPECT_EQ(request.default_extension, "trk");
+    return std::optional<std::string>(path);
+  });
+  ASSERT_EQ(Apply(), 0);
+  EXPECT_EQ(Change(kSaveAt), 0);  // no frames yet
+  EXPECT_FALSE(std::filesystem::exists(path));
+  Settle();
+  host_.params[kSaveAt].ui_flags = HX_PARAM_UI_DISABLED;
+  EXPECT_EQ(Change(kSaveAt), 0);
+  EXPECT_EQ(std::filesystem::file_size(path), 20u + 16 * 4 * 500);
+  EXPECT_TRUE(Enabled(kSaveAt));
+  std::filesystem::remove(path);
+  tesselui::InstallSaveDialog({});
 }
 
 // Every operation of the host fails once, wherever it comes in a short life of an instance.

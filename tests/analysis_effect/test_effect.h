@@ -37,7 +37,8 @@ enum TestIndex : std::int32_t {
   kCancelAt = 2,
   kDetailedAt = 3,
   kCounterAt = 4,
-  kTestParamCount = 5  // all others are not declared
+  kSaveAt = 5,
+  kTestParamCount = 6  // all others are not declared
 };
 
 // An analysing effect that makes nothing of its analysis. Its handle holds a pointer to the state.
@@ -75,8 +76,12 @@ class TestEffect final : public AnalysisEffect {
     return -1;
   }
   std::int32_t IndexToParamId(std::int32_t index) override {
-    constexpr std::int32_t ids[] = {-1, kAnalyzeParam, kCancelParam, kDetailedAnalysisParam,
-                                    kAnalysisStatusCounterParam};
+    constexpr std::int32_t ids[] = {-1,
+                                    kAnalyzeParam,
+                                    kCancelParam,
+                                    kDetailedAnalysisParam,
+                                    kAnalysisStatusCounterParam,
+                                    kSaveTrackFileParam};
     return index > 0 && index < kTestParamCount ? ids[index] : -1;
   }
   bool IsExperimentalIndex(std::int32_t index) override {
