@@ -148,9 +148,10 @@ class EffectTest : public ::testing::Test {
   ~EffectTest() override {
     host_.FailOperation(0);
     EXPECT_EQ(Call(HX_CMD_DESTROY_INSTANCE), 0);
-    if (renderer_->callbacks == FakeRenderer::Callbacks::kHeld) renderer_->Deliver();
+    if (renderer_->callbacks == FakeRenderer::Callbacks::kHeld) renderer_->Resume();
     tessel::threads::Shutdown();
     TestEffect::log = {};
+    renderer_->Stop();
     EXPECT_EQ(renderer_->Leaks(), "");
     EXPECT_EQ(host_.Leaks(), "");
     renderer_.reset();
@@ -169,13 +170,20 @@ class EffectTest : public ::testing::Test {
     HX_ParamChangedExtra extra{index};
     return Call(HX_CMD_PARAM_CHANGED, &extra);
   }
-  // Whether the instance has an analyzer; a look that is no operation of the host's.
-  bool Analyses() const {
-    if (!host_.in.instance_handle) return false;
+  // The instance's analyzer or null; a look that is no operation of the host's.
+  boost::shared_ptr<Analyzer> FindAnalyzer() const {
+    if (!host_.in.instance_handle) return {};
     const std::string bytes = host_.handle_bytes(host_.in.instance_handle);
     AnalysisState* state = nullptr;
     std::copy_n(bytes.data(), sizeof state, reinterpret_cast<char*>(&state));
-    return state && state->analyzer;
+    return state ? state->analyzer : boost::shared_ptr<Analyzer>();
+  }
+  bool Analyses() const { return FindAnalyzer() != nullptr; }
+  // Until the job of a started analysis is in its last state.
+  void WaitForJob() const {
+    const boost::shared_ptr<Analyzer> analyzer = FindAnalyzer();
+    if (!analyzer || analyzer->job_stage() == JobStage::NotStarted) return;
+    while (analyzer->GetStatus().state < JobState::Failed) std::this_thread::yield();
   }
   // Ticks until nothing is analysed any more.
   void Settle() {
