@@ -37,7 +37,8 @@ enum TestIndex : std::int32_t {
   kCancelAt = 2,
   kDetailedAt = 3,
   kCounterAt = 4,
-  kTestParamCount = 5  // all others are not declared
+  kSaveAt = 5,
+  kTestParamCount = 6  // all others are not declared
 };
 
 // An analysing effect that makes nothing of its analysis. Its handle holds a pointer to the state.
@@ -75,8 +76,12 @@ class TestEffect final : public AnalysisEffect {
     return -1;
   }
   std::int32_t IndexToParamId(std::int32_t index) override {
-    constexpr std::int32_t ids[] = {-1, kAnalyzeParam, kCancelParam, kDetailedAnalysisParam,
-                                    kAnalysisStatusCounterParam};
+    constexpr std::int32_t ids[] = {-1,
+                                    kAnalyzeParam,
+                                    kCancelParam,
+                                    kDetailedAnalysisParam,
+                                    kAnalysisStatusCounterParam,
+                                    kSaveTrackFileParam};
     return index > 0 && index < kTestParamCount ? ids[index] : -1;
   }
   bool IsExperimentalIndex(std::int32_t index) override {
@@ -143,9 +148,10 @@ class EffectTest : public ::testing::Test {
   ~EffectTest() override {
     host_.FailOperation(0);
     EXPECT_EQ(Call(HX_CMD_DESTROY_INSTANCE), 0);
-    if (renderer_->callbacks == FakeRenderer::Callbacks::kHeld) renderer_->Deliver();
+    if (renderer_->callbacks == FakeRenderer::Callbacks::kHeld) renderer_->Resume();
     tessel::threads::Shutdown();
     TestEffect::log = {};
+    renderer_->Stop();
     EXPECT_EQ(renderer_->Leaks(), "");
     EXPECT_EQ(host_.Leaks(), "");
     renderer_.reset();
@@ -164,13 +170,20 @@ class EffectTest : public ::testing::Test {
     HX_ParamChangedExtra extra{index};
     return Call(HX_CMD_PARAM_CHANGED, &extra);
   }
-  // Whether the instance has an analyzer; a look that is no operation of the host's.
-  bool Analyses() const {
-    if (!host_.in.instance_handle) return false;
+  // The instance's analyzer or null; a look that is no operation of the host's.
+  boost::shared_ptr<Analyzer> FindAnalyzer() const {
+    if (!host_.in.instance_handle) return {};
     const std::string bytes = host_.handle_bytes(host_.in.instance_handle);
     AnalysisState* state = nullptr;
     std::copy_n(bytes.data(), sizeof state, reinterpret_cast<char*>(&state));
-    return state && state->analyzer;
+    return state ? state->analyzer : boost::shared_ptr<Analyzer>();
+  }
+  bool Analyses() const { return FindAnalyzer() != nullptr; }
+  // Until the job of a started analysis is in its last state.
+  void WaitForJob() const {
+    const boost::shared_ptr<Analyzer> analyzer = FindAnalyzer();
+    if (!analyzer || analyzer->job_stage() == JobStage::NotStarted) return;
+    while (analyzer->GetStatus().state < JobState::Failed) std::this_thread::yield();
   }
   // Ticks until nothing is analysed any more.
   void Settle() {

@@ -164,13 +164,17 @@ FakeRenderer::FakeRenderer(FakeHost& host) {
 }
 
 FakeRenderer::~FakeRenderer() {
+  Stop();
+  current = nullptr;
+}
+
+void FakeRenderer::Stop() {
   {
     const std::lock_guard<std::mutex> lock(mutex_);
     stops_ = true;
   }
   changed_.notify_all();
-  worker_.join();
-  current = nullptr;
+  if (worker_.joinable()) worker_.join();
 }
 
 void FakeRenderer::Work() {
@@ -215,6 +219,12 @@ void FakeRenderer::Finish(const Pending& pending) {
 std::vector<FakeRenderer::Request> FakeRenderer::requests() const {
   const std::lock_guard<std::mutex> lock(mutex_);
   return requests_;
+}
+
+void FakeRenderer::Resume() {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  callbacks = Callbacks::kLater;
+  changed_.notify_all();
 }
 
 int FakeRenderer::cancelled() const {

@@ -50,6 +50,10 @@ class FakeRenderer {
   int cancelled() const;
   // Calls back what is held, cancelled or not.
   void Deliver();
+  // No callback is held any more.
+  void Resume();
+  // Ends the render thread, when all that is not held has its callback.
+  void Stop();
   // Until `count` requests are held.
   void WaitForHeld(std::size_t count);
 

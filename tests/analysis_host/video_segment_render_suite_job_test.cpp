@@ -45,6 +45,7 @@ class VideoSegmentRenderSuiteJobTest : public ::testing::Test {
   }
   ~VideoSegmentRenderSuiteJobTest() override {
     End();
+    renderer_->Stop();
     EXPECT_EQ(renderer_->Leaks(), "");
     EXPECT_EQ(host_.Leaks(), "");
     renderer_.reset();
