@@ -2,6 +2,7 @@
 
 #include <gmock/gmock.h>
 
+#include <boost/make_shared.hpp>
 #include <cmath>
 #include <functional>
 
@@ -215,13 +216,17 @@ TEST(StabilizeTest, ExtremeCroppingIsTold) {
   } cases[] = {{43, 32, 0}, {42, 40, 1}, {100, 31, 1}};
   for (const auto& c : cases) {
     ears.warnings.clear();
-    solution.crop->cropWidth = c.width;
-    solution.crop->cropHeight = c.height;
+    const auto crop = boost::make_shared<cropper>(*solution.crop);
+    crop->cropWidth = c.width;
+    crop->cropHeight = c.height;
+    solution.crop = crop;
     KeptFrames frames(clip.info());
     Render(clip, solution, controls, 8, frames, ears);
     EXPECT_EQ(ears.warnings.size(), c.warnings) << c.width << " x " << c.height;
   }
-  solution.crop->cropWidth = 0;
+  const auto crop = boost::make_shared<cropper>(*solution.crop);
+  crop->cropWidth = 0;
+  solution.crop = crop;
   KeptFrames frames(clip.info());
   EXPECT_THROW(Render(clip, solution, controls, 8, frames, ears), SolveFailure);
 }
