@@ -45,16 +45,6 @@ TEST(Picture, AFieldFillsItsFrameFromItsOwnLines) {
   FieldsOfFiveLines<HX_PixelFloat>(PixelKind::argbf);
 }
 
-TEST(Picture, RowsAreCountedFromTheTopWhereverTheyLie) {
-  const auto pool = PicturePool::Make();
-  const auto picture = pool->NewPicture(PixelKind::argb8, 3, 2, 20, false);
-  EXPECT_EQ(picture->row_bytes(), 32);
-  EXPECT_EQ(picture->bytes(), 64u);
-  Ramp<HX_Pixel8>(*picture);
-  EXPECT_EQ(picture->memory()[3], 10) << "the bottom row is the first in memory";
-  EXPECT_EQ(picture->memory()[32 + 4 * 2 + 3], 2);
-}
-
 TEST(Picture, MemoryIsUsedAgainAndOutlivesThePool) {
   auto pool = PicturePool::Make();
   PicturePtr kept = pool->NewPicture(PixelKind::argb16, 8, 8);
@@ -67,19 +57,6 @@ TEST(Picture, MemoryIsUsedAgainAndOutlivesThePool) {
   pool = nullptr;
   EXPECT_EQ(kept->memory(), first);
   EXPECT_THROW(PicturePool::Make()->NewPicture(PixelKind::argbf, 1 << 30, 2), std::bad_alloc);
-}
-
-TEST(Picture, ColoursAreRoundedToTheDepth) {
-  const auto pool = PicturePool::Make();
-  const auto green = [&](PixelKind kind, auto pixel) {
-    const auto picture = pool->NewPicture(kind, 2, 1);
-    FillPicture(*picture, [](int x, int) { return HX_PixelFloat{1, 0, x ? 0.5f : 1.5f, 0}; });
-    const auto* row = std::as_const(*picture).template row<decltype(pixel)>(0);
-    return std::pair<double, double>(row[0].green, row[1].green);
-  };
-  EXPECT_EQ(green(PixelKind::argb8, HX_Pixel8{}), (std::pair(255.0, 128.0)));
-  EXPECT_EQ(green(PixelKind::argb16, HX_Pixel16{}), (std::pair(32768.0, 16384.0)));
-  EXPECT_EQ(green(PixelKind::argbf, HX_PixelFloat{}), (std::pair(1.5, 0.5)));
 }
 
 TEST(ResizedSource, ScalesOnceAndIsAnotherIdentity) {

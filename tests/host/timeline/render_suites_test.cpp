@@ -135,16 +135,9 @@ TEST_F(RenderSuitesTest, NamesAreEqualForEqualFramesAlone) {
   const HX_Node upstream = InputNode();
   name("behind an effect", Identifier(upstream, kFrame));
   layer->InsertEffect(2, {60, "Downstream", "", {}});
-  for (const HX_Node one : {node, fields, upstream}) graph.ReleaseNode(one);
-  HX_Segments segments = 0;
-  HX_Node top = 0, below = 0, input = 0;
-  sequence.AcquireSegments(effect, &segments);
-  graph.GetSegmentNodeAt(segments, 0, &top);
-  graph.GetInput(top, 0, &below);
-  graph.GetInput(below, 0, &input);
-  EXPECT_EQ(names[Identifier(input, kFrame)], "behind an effect");
-  for (const HX_Node one : {top, below, input}) graph.ReleaseNode(one);
-  sequence.ReleaseSegments(segments);
+  const HX_Node below = NodeBelow(2);
+  EXPECT_EQ(names[Identifier(below, kFrame)], "behind an effect") << "what is downstream is none";
+  for (const HX_Node one : {node, fields, upstream, below}) graph.ReleaseNode(one);
 }
 
 TEST_F(RenderSuitesTest, FieldsComeInTheOrderTheyWereShot) {
@@ -179,18 +172,11 @@ TEST_F(RenderSuitesTest, EffectsBeneathAreDrawnAndThoseAboveAreNot) {
   layer->InsertEffect(0, {50, "First", "", adds(10)});
   layer->InsertEffect(1, {51, "Second", "", adds(3)});
   layer->InsertEffect(3, {60, "Downstream", "", adds(100)});
-  HX_Segments segments = 0;
-  HX_Node top = 0, own = 0, input = 0;
-  sequence.AcquireSegments(effect, &segments);
-  graph.GetSegmentNodeAt(segments, 0, &top);
-  graph.GetInput(top, 0, &own);
-  graph.GetInput(own, 0, &input);
+  const HX_Node top = NodeBelow(0), own = NodeBelow(1), input = NodeBelow(2);
   EXPECT_EQ(Sample(Render(input, kFrame), 0, 0), std::pair(26, 1));  // (2 * 0 + 11) * 2 + 4
-  EXPECT_EQ(Sample(Render(own, kFrame), 0, 0), std::pair(26, 1))
-      << "the effect itself draws nothing";
+  EXPECT_EQ(Sample(Render(own, kFrame), 0, 0), std::pair(26, 1)) << "the effect draws nothing";
   EXPECT_EQ(Sample(Render(top, kFrame), 0, 0), std::pair(153, 1));
   for (const HX_Node one : {top, own, input}) graph.ReleaseNode(one);
-  sequence.ReleaseSegments(segments);
   InputRequest request;
   request.time_ticks = kFrame;
   EXPECT_EQ(services.Input(effect, request)->row<HX_Pixel8>(0)[0].red, 26);

@@ -65,17 +65,22 @@ class TimelineTest : public testing::Test {
     return taken;
   }
 
-  // The node that enters the effect.
-  HX_Node InputNode() {
-    HX_Segments found = 0;
-    HX_Node top = 0, input = 0;
-    EXPECT_EQ(sequence.AcquireSegments(effect, &found), HX_ERR_NONE);
-    EXPECT_EQ(graph.GetSegmentNodeAt(found, 0, &top), HX_ERR_NONE);
-    EXPECT_EQ(graph.GetInput(top, 0, &input), HX_ERR_NONE);
-    EXPECT_EQ(graph.ReleaseNode(top), HX_ERR_NONE);
-    EXPECT_EQ(sequence.ReleaseSegments(found), HX_ERR_NONE);
-    return input;
+  // The node so many levels beneath the top one; 1 enters the effect if none is downstream.
+  HX_Node NodeBelow(int levels) {
+    HX_Segments segments = 0;
+    HX_Node node = 0;
+    EXPECT_EQ(sequence.AcquireSegments(effect, &segments), HX_ERR_NONE);
+    EXPECT_EQ(graph.GetSegmentNodeAt(segments, 0, &node), HX_ERR_NONE);
+    EXPECT_EQ(sequence.ReleaseSegments(segments), HX_ERR_NONE);
+    while (levels-- > 0) {
+      HX_Node input = 0;
+      EXPECT_EQ(graph.GetInput(node, 0, &input), HX_ERR_NONE);
+      EXPECT_EQ(graph.ReleaseNode(node), HX_ERR_NONE);
+      node = input;
+    }
+    return node;
   }
+  HX_Node InputNode() { return NodeBelow(1); }
 
   static constexpr std::uint32_t kOwnId = 41;
   MediaServices services;
