@@ -24,6 +24,16 @@ using kelp::effect::ScopedSuite;
 using kelp::effect::ThrowIfFailed;
 using tessel::utility::HighPrecisionTime;
 
+namespace {
+
+void EndJob(const kelp::effect::HostContext& context, Analyzer& analyzer,
+            const std::string& text = {}) {
+  analyzer.Cancel(context.in, context.out, text.c_str());
+  analyzer.Stop(context.in, context.out);
+}
+
+}  // namespace
+
 void AnalysisEffect::UpdateButton(std::int32_t id, bool enabled, const char* name) {
   const std::int32_t index = ParamIdToIndex(id);
   if (index != kNoIndex) kelp::effect::UpdateParamUI(context(), index, {enabled, name});
@@ -120,9 +130,7 @@ void AnalysisEffect::StartAnalysis() {
 void AnalysisEffect::CancelAnalysis(AnalysisState* state, HX_ParamDef** params, bool show_text) {
   if (state == nullptr || !state->analyzer) return;
   const std::string text = GetCancelMessage();
-  const boost::shared_ptr<Analyzer> analyzer = state->analyzer;
-  analyzer->Cancel(context().in, context().out, text.c_str());
-  analyzer->Stop(context().in, context().out);
+  EndJob(context(), *state->analyzer, text);
   state->analyzer.reset();
   if (show_text) kelp::effect::ShowInfoText(context(), text.c_str(), nullptr);
   if (params != nullptr) PublishStatus(FrameStatus::PressAnalyze);
@@ -156,7 +164,10 @@ void AnalysisEffect::PollAnalysis(AnalysisState& state) {
   const JobState job = analyzer->GetStatus().state;
   const bool failed_with_text =
       analyzer->ReportFailure(context().in, context().out) && !analyzer->GetErrorText().empty();
-  if (job == JobState::Running) analyzer->set_job_stage(JobStage::SeenRunning);
+  if (job == JobState::Running && analyzer->job_stage() != JobStage::SeenRunning) {
+    analyzer->set_job_stage(JobStage::SeenRunning);
+    state.progress.start_tick = HighPrecisionTime::Now();
+  }
   if (job <= JobState::Running) {
     RefreshParams();
   } else if (analyzer->job_stage() == JobStage::SeenRunning) {
@@ -177,10 +188,15 @@ void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
   analyzer.swap(state.analyzer);
   // One that can't start is gone, so that it is not tried again with each tick.
   analyzer->Start(context().in, context().out);
-  AnalysisState* const present = GetState();
+  AnalysisState* present = nullptr;
+  try {
+    present = GetState();
+  } catch (...) {  // nobody would end the job
+    EndJob(context(), *analyzer);
+    throw;
+  }
   if (present == nullptr) {
-    analyzer->Cancel(context().in, context().out, "");
-    analyzer->Stop(context().in, context().out);
+    EndJob(context(), *analyzer);
     return;
   }
   present->first_analysis = true;

@@ -49,7 +49,7 @@ CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World
   in.width = source.width;
   in.height = source.height;
   in.pixel_aspect = source.pixel_aspect;
-  in.current_time = time.OfFrame(place.frame);
+  in.current_time = time.OfFrame(place.frame, place.second_field);
   in.time_step = time.step();
   in.total_time = time.total();
   in.time_scale = time.scale();

@@ -44,6 +44,7 @@ class Instance {
   // frames it may work.
   struct Place {
     std::int64_t frame = 0;
+    bool second_field = false;
     RenderContext* frames = nullptr;  // null: at 8 bit and full scale
     HX_World* input = nullptr;        // of params[0]; null: its size alone
   };

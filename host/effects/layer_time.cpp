@@ -28,7 +28,9 @@ LayerTime::LayerTime(const LayerState& layer)
       start_frame_(layer.start_frame),
       length_(std::max(layer.length, 0)) {
   const std::int64_t common = std::gcd(ticks_per_frame_, HX_TICKS_PER_SECOND);
-  std::int64_t scale = HX_TICKS_PER_SECOND / common, step = ticks_per_frame_ / common;
+  const int fields = layer.field_type == HX_FIELD_PROGRESSIVE ? 1 : 2;
+  std::int64_t scale = fields * (HX_TICKS_PER_SECOND / common);
+  std::int64_t step = fields * (ticks_per_frame_ / common);
   // A frame more than the layer, and as many again for what is asked around it.
   const std::int64_t frames = 2 * (std::int64_t{length_} + 1);
   if (step > kLimit / frames) {
@@ -40,10 +42,10 @@ LayerTime::LayerTime(const LayerState& layer)
   step_ = static_cast<std::int32_t>(std::min(step, kLimit));
 }
 
-std::int32_t LayerTime::OfFrame(std::int64_t frame) const {
-  const auto exact = static_cast<__int128>(frame) * ticks_per_frame_ * scale_;
-  __int128 time = exact / HX_TICKS_PER_SECOND;
-  if (exact % HX_TICKS_PER_SECOND > 0) ++time;
+std::int32_t LayerTime::OfFrame(std::int64_t frame, bool second_field) const {
+  const auto twice = (static_cast<__int128>(frame) * 2 + second_field) * ticks_per_frame_ * scale_;
+  __int128 time = twice / (2 * HX_TICKS_PER_SECOND);
+  if (twice % (2 * HX_TICKS_PER_SECOND) > 0) ++time;
   return static_cast<std::int32_t>(std::clamp<__int128>(time, -kLimit, kLimit));
 }
 

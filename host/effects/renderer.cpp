@@ -97,15 +97,15 @@ RenderedFrame Renderer::Direct(const RenderRequest& request) {
   rendered.layer_height = frames.height();
 
   const LayerTime time(frames.layer());
-  const HX_World* input =
-      frames.CheckOutInput(time.MediaTicks(time.OfFrame(request.frame), time.scale()));
+  const HX_World* input = frames.CheckOutInput(
+      time.MediaTicks(time.OfFrame(request.frame, request.second_field), time.scale()));
   // Where the media has no frame the layer is clear.
   std::optional<WorldBuffer> clear;
   HX_World world =
       input ? *input
             : clear.emplace(frames.width(), frames.height(), FormatOfDepth(request.bit_depth))
                   .world();
-  Instance::Place place{request.frame, &frames, &world};
+  Instance::Place place{request.frame, request.second_field, &frames, &world};
 
   HX_OutData setup{};
   setup.width = frames.width();
@@ -143,7 +143,7 @@ RenderedFrame Renderer::Planned(const RenderRequest& request) {
   frames.FreezeParams(instance_->effect()->params().All());
   rendered.layer_width = frames.width();
   rendered.layer_height = frames.height();
-  const Instance::Place place{request.frame, &frames, nullptr};
+  const Instance::Place place{request.frame, request.second_field, &frames, nullptr};
 
   HX_PlanExtra plan{};
   plan.request.rect = request.part.value_or(HX_Rect{0, 0, frames.width(), frames.height()});

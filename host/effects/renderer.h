@@ -10,11 +10,12 @@
 namespace calmframe::host {
 
 struct RenderRequest {
-  std::int64_t frame = 0;  // of the layer, counted from its in-point
-  int bit_depth = 8;       // 8 or 16; 32 on the planned path alone
+  std::int64_t frame = 0;     // of the layer, counted from its in-point
+  int bit_depth = 8;          // 8 or 16; 32 on the planned path alone
   HX_Ratio downsample{1, 1};
   // Part of the frame that is wanted, in layer coordinates at render scale; none: the whole.
   std::optional<HX_Rect> part = {};
+  bool second_field = false;  // of an interlaced layer's frame: half a frame later
 };
 
 struct RenderedFrame {

@@ -116,6 +116,9 @@ const HX_PrivateEffectSuite3& PrivateSuite() {
 const HX_StringSuite1& StringSuite() {
   static const HX_StringSuite1 suite = [] {
     HX_StringSuite1 table{};
+    table.MakeFromUTF8 = [](const char* text, HX_String* string) {
+      return AnswerString("MakeFromUTF8", text, string);
+    };
     table.GetUTF8 = [](HX_String string, const char** text) {
       return Answer("GetUTF8", text, string->text.c_str());
     };

@@ -212,29 +212,40 @@ struct FakeHostCallbacks {
     return HX_ERR_NONE;
   }
   // The mean of the pixels that a pixel of the copy covers, as far as they are whole.
-  static HX_Err CopyWorld(HX_EffectRef, const HX_World* from, HX_World* to, const HX_Rect*,
-                          const HX_Rect*) {
+  static HX_Err CopyWorld(HX_EffectRef, const HX_World* from, HX_World* to,
+                          const HX_Rect* from_rect, const HX_Rect* to_rect) {
     Lock lock(current->mutex_);
     if (current->Operate("copy_world")) return FakeHost::kFault;
-    for (int y = 0; y < to->height; ++y) {
-      for (int x = 0; x < to->width; ++x) {
-        const int left = x * from->width / to->width, top = y * from->height / to->height;
-        const int right = std::max(left + 1, (x + 1) * from->width / to->width);
-        const int bottom = std::max(top + 1, (y + 1) * from->height / to->height);
+    const HX_Rect s = from_rect ? *from_rect : HX_Rect{0, 0, from->width, from->height};
+    const HX_Rect d = to_rect ? *to_rect : HX_Rect{0, 0, to->width, to->height};
+    const int from_width = s.right - s.left, from_height = s.bottom - s.top;
+    const int to_width = d.right - d.left, to_height = d.bottom - d.top;
+    for (int y = 0; y < to_height; ++y) {
+      for (int x = 0; x < to_width; ++x) {
+        const int left = x * from_width / to_width, top = y * from_height / to_height;
+        const int right = std::max(left + 1, (x + 1) * from_width / to_width);
+        const int bottom = std::max(top + 1, (y + 1) * from_height / to_height);
         FakePixel sum{0, 0, 0, 0};
         for (int v = top; v < bottom; ++v) {
           for (int u = left; u < right; ++u) {
-            const FakePixel p = LoadFakePixel(*from, u, v);
+            const FakePixel p = LoadFakePixel(*from, s.left + u, s.top + v);
             sum = {sum.a + p.a, sum.r + p.r * p.a, sum.g + p.g * p.a, sum.b + p.b * p.a};
           }
         }
         const double alpha = sum.a > 0 ? sum.a : 1;
-        StoreFakePixel(*to, x, y,
+        StoreFakePixel(*to, d.left + x, d.top + y,
                        {sum.a / ((right - left) * (bottom - top)), sum.r / alpha, sum.g / alpha,
                         sum.b / alpha});
       }
     }
     return HX_ERR_NONE;
+  }
+  static HX_Err Utility(HX_EffectRef, std::int32_t operation, const void* table) {
+    Lock lock(current->mutex_);
+    current->Expect((operation == HX_UTILITY_BEGIN_RENDER) == (table != nullptr),
+                    "a render's beginning, alone, has a table");
+    return current->Operate("utility " + std::to_string(operation)) ? FakeHost::kFault
+                                                                    : HX_ERR_NONE;
   }
 
   static HX_Err NewWorld(HX_EffectRef, std::int32_t width, std::int32_t height, std::uint8_t,
@@ -291,6 +302,7 @@ struct FakeHostCallbacks {
       cb.copy_text = CopyText;
       cb.copy_world = CopyWorld;
       cb.transfer = Transfer;
+      cb.utility = Utility;
       return cb;
     }();
     return callbacks;
@@ -350,6 +362,12 @@ void FakeHost::Offer(const std::string& name, std::int32_t version, const void* 
 std::vector<std::string> FakeHost::info_text() const {
   std::lock_guard<std::recursive_mutex> lock(mutex_);
   return info_text_;
+}
+
+int FakeHost::Count(const std::string& name) const {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  return static_cast<int>(std::count_if(operations_.begin(), operations_.end(),
+                                        [&](const Operation& o) { return o.name == name; }));
 }
 
 int FakeHost::rerenders() const {

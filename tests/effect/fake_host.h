@@ -48,9 +48,14 @@ class FakeHost {
   void OfferAllSuites() { refused_.clear(); }
   const std::vector<Operation>& operations() const { return operations_; }
   void ForgetOperations() { operations_.clear(); }
+  // How many operations have this name.
+  int Count(const std::string& name) const;
 
   // Offers a table beside the fake's own: Param Utils 3, Private Effect 3, Adv App 1 and World 2.
   void Offer(const std::string& name, std::int32_t version, const void* table);
+
+  // Held by every operation: for a test that changes what other threads read.
+  std::recursive_mutex& mutex() { return mutex_; }
 
   // Index 0 is the layer; the rest is what add_param appended. Checkouts give copies.
   std::vector<HX_ParamDef> params;

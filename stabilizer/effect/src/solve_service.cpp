@@ -54,12 +54,14 @@ std::int32_t PopupOf(HX_ParamDef** params, ParamIndex index) {
 }  // namespace
 
 bool StabilizerEffect::ServiceAnalysis(bool from_render) {
+  if (const StabilizerState* const copy = GetState(); copy && copy->keep_jobs) return false;
   if (AnalysisEffect::ServiceAnalysis(from_render)) return true;
   StabilizerState* const state = GetState();
   if (!state) {
     PublishSharedData();
     return false;
   }
+  if (state->unpublished != FrameStatus::None) PublishStatus(state->unpublished);
   if (state->solver) {
     const Solver::State status = state->solver->GetState();
     if (status == Solver::finished || status == Solver::failed) FinishSolve(*state);
@@ -132,18 +134,14 @@ void StabilizerEffect::FinishSolve(StabilizerState& state) {
   state.TakeSolve();
   const FrameStatus status =
       state.phase == SolvePhase::Solved ? FrameStatus::Ready : FrameStatus::SolveFailed;
+  state.unpublished = status;  // whoever waits for the results must learn of them, come what may
   const bool first = std::exchange(state.first_analysis, false);
-  try {
-    RefreshParams();
-    RefreshAllWindows(context());
-    if (first) {
-      const std::string time = MinutesAndSeconds(
-          HighPrecisionTime::Seconds(state.progress.start_tick, HighPrecisionTime::Now()));
-      ShowInfoText(context(), GetString(context(), kStringFinished), time.c_str());
-    }
-  } catch (...) {  // the results stand, and whoever waits for them must learn it
-    PublishStatus(status);
-    throw;
+  RefreshParams();
+  RefreshAllWindows(context());
+  if (first) {
+    const std::string time = MinutesAndSeconds(
+        HighPrecisionTime::Seconds(state.progress.start_tick, HighPrecisionTime::Now()));
+    ShowInfoText(context(), GetString(context(), kStringFinished), time.c_str());
   }
   PublishStatus(status);
 }
@@ -240,8 +238,11 @@ void StabilizerEffect::MarkAnalysisFailed() {
 }
 
 void StabilizerEffect::PublishStatus(FrameStatus status) {
+  StabilizerState* const state = GetState();
+  if (state) state->unpublished = status;
   PublishSharedData();
   AnalysisEffect::PublishStatus(status);
+  if (state) state->unpublished = FrameStatus::None;
 }
 
 }  // namespace kelp::effect

@@ -80,6 +80,8 @@ class StabilizerState final : public analysis::AnalysisState {
   std::uint32_t solve_hash = 0;
   std::uint32_t crop_hash = 0;
   StabilizerSharedData* shared = nullptr;  // attached to; see StabilizerEffect::AttachSharedData
+  // What the host still has to be told, where telling it has failed.
+  analysis::FrameStatus unpublished = analysis::FrameStatus::None;
   // The size of the source about which the user was told last that the state is of another.
   analysis::SourceSize reported_size;
 
