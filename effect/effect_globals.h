@@ -7,15 +7,17 @@
 #include "effect/handle.h"
 #include "effect/host_context.h"
 
-namespace kelp::effect {
+namespace kelp::analysis::effect {
+class BannerCache;
+}
 
-class BannerCache;  // of whoever draws banners
+namespace kelp::effect {
 
 // The one block of the whole plug-in, in a handle of the host's. The host moves the block while it
 // is unlocked, which shared pointers bear.
 struct EffectGlobals {
   std::uint64_t string_token;
-  boost::shared_ptr<BannerCache> banner_cache;      // guarded by *banner_cache_lock
+  boost::shared_ptr<analysis::effect::BannerCache> banner_cache;  // guarded by *banner_cache_lock
   boost::shared_ptr<std::mutex> banner_cache_lock;  // constant from StartPlugin to StopPlugin
 };
 static_assert(sizeof(EffectGlobals) == 40);

@@ -31,12 +31,13 @@ class HandleLock {
   void* const data_;
 };
 
-// A new block, zeroed, that is disposed of unless somebody releases it. Null when there is no
-// memory.
+// A block that is disposed of unless somebody releases it: a new one, zeroed, null when there is no
+// memory; or one that is given.
 class OwnedHandle {
  public:
   OwnedHandle(const HX_Callbacks& host, std::uint64_t size)
       : host_(host), handle_(host.new_handle(size)) {}
+  OwnedHandle(const HX_Callbacks& host, HX_Handle handle) : host_(host), handle_(handle) {}
   ~OwnedHandle() {
     if (handle_) host_.dispose_handle(handle_);
   }

@@ -17,6 +17,11 @@ struct HostContext {
   void* extra;
 };
 
+// For code that is handed the host's records alone, below any command.
+inline HostContext RecordsOnly(HX_InData* host_in, HX_OutData* host_out) {
+  return {0, host_in, host_out, nullptr, nullptr, nullptr};
+}
+
 // A host's code is thrown as it came, as a 32-bit integer; the entry hands it back to the host.
 inline void ThrowIfFailed(HX_Err code) {
   if (code != HX_ERR_NONE) throw std::int32_t{code};

@@ -1,5 +1,6 @@
 #include "effect/host_text.h"
 
+#include <algorithm>
 #include <vector>
 
 #include "effect/effect_globals.h"
@@ -20,6 +21,14 @@ constexpr int kMajorVersion = 1;
 constexpr int kMinorVersion = 0;
 constexpr std::size_t kFormatSize = 512;  // bound of HX_Callbacks.format
 
+void ConvertUnits(const HostContext& context, const std::u16string& text, char* to,
+                  std::uint32_t size) {
+  std::vector<std::uint16_t> units(text.begin(), text.end());
+  units.push_back(0);
+  const ScopedSuite<HX_PrivateEffectSuite3> suite(context);
+  ThrowIfFailed(suite->ConvertText(units.data(), to, size));
+}
+
 void ReportOnFrame(const HostContext& context, const char* literal, std::int64_t frame) noexcept {
   try {
     const std::string text = tessel::utility::ReplaceInString(
@@ -37,13 +46,32 @@ void ShowMessage(const HostContext& context, const char* text) {
   context.in->cb->copy_text(context.out->return_msg, HX_RETURN_MSG_SIZE, text);
 }
 
+void ClearMessage(const HostContext& context) {
+  context.out->out_flags &= ~std::uint32_t{HX_OUT_FLAG_SHOW_MESSAGE};
+  context.out->return_msg[0] = '\0';
+}
+
 void ConvertToHostText(const HostContext& context, const std::string& text, char* to,
                        std::uint32_t size) {
-  const std::u16string wide = tessel::utility::ToUTF16(text);
-  std::vector<std::uint16_t> units(wide.begin(), wide.end());
-  units.push_back(0);
-  const ScopedSuite<HX_PrivateEffectSuite3> suite(context);
-  ThrowIfFailed(suite->ConvertText(units.data(), to, size));
+  ConvertUnits(context, tessel::utility::ToUTF16(text), to, size);
+}
+
+void ConvertToHostText(const HostContext& context, const std::u16string& text,
+                       char (&to)[kHostTextSize]) {
+  ConvertUnits(context, text, to, kHostTextSize);
+}
+
+std::u16string UnitsToText(const std::uint16_t (&units)[kHostUnits]) {
+  return std::u16string(units, std::find(units, units + kHostUnits, 0));
+}
+
+std::string TakeText(const HX_StringSuite1& strings, HX_String string) {
+  const char* bytes = nullptr;
+  const HX_Err code = strings.GetUTF8(string, &bytes);
+  const std::string text = code == HX_ERR_NONE && bytes != nullptr ? bytes : "";
+  strings.Dispose(string);
+  ThrowIfFailed(code);
+  return text;
 }
 
 const char* GetString(const HostContext& context, std::int32_t index) {

@@ -88,6 +88,7 @@ class ScopedSuite : private SuiteReference {
       : SuiteReference(context, {kSuite<Table>.name, version}, message) {}
 
   const Table* operator->() const { return static_cast<const Table*>(table_); }
+  const Table& operator*() const { return *static_cast<const Table*>(table_); }
 };
 
 }  // namespace kelp::effect

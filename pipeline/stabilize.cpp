@@ -27,9 +27,8 @@ ClipGeometry GeometryOf(const media::ClipInfo& info) {
   clip.height = static_cast<std::uint32_t>(info.height);
   clip.pixel_aspect_num = info.pixel_aspect.num;
   clip.pixel_aspect_den = info.pixel_aspect.den;
-  clip.frame_rate = static_cast<double>(info.frame_rate.num) /
-                    static_cast<double>(info.frame_rate.den) *
-                    static_cast<double>(Pictures(info).per_frame());
+  clip.frame_rate =
+      static_cast<double>(info.frame_rate.num) / static_cast<double>(info.frame_rate.den);
   return clip;
 }
 

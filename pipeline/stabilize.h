@@ -39,8 +39,8 @@ class SolveFailure : public std::runtime_error {
 
 // What a solve leaves for the render and for reports.
 struct Solution {
-  boost::shared_ptr<marrow::stabilization::CPWarper> warper;
-  boost::shared_ptr<cropper> crop;  // null unless Framing crops
+  boost::shared_ptr<const marrow::stabilization::CPWarper> warper;
+  boost::shared_ptr<const cropper> crop;  // null unless Framing crops
   std::vector<marrow::stabilization::factorization_window> factorization_windows;
   std::vector<marrow::stabilization::transition_record> transition_windows;
 };

@@ -83,8 +83,9 @@ void CPWarper::buildDisplacements(boost::shared_ptr<const stabilizer_global> sta
   homographyLimit_ = parameters.homography_limit;
   global_ = std::move(stabilizerGlobal);
   solving_ = nullptr;
-  frameDisplacements_ = blended_displacements(*global_, factorizationWindows, parameters, progress);
-  frameDisplacements_.resize(static_cast<std::size_t>(frameCount_));
+  *frameDisplacements_ =
+      blended_displacements(*global_, factorizationWindows, parameters, progress);
+  frameDisplacements_->resize(static_cast<std::size_t>(frameCount_));
   progress();
   computeModelScores(factorizationWindows, transitionWindows, parameters.method_level);
   progress();
@@ -97,23 +98,23 @@ void CPWarper::buildDisplacementsForWindows(stabilizer_global& stabilizerGlobal,
                                             const std::vector<factorization_window>& windows,
                                             const SolverParamsRecord& parameters) {
   solving_ = &stabilizerGlobal;
-  frameDisplacements_ = member_displacements(stabilizerGlobal, windows, parameters);
-  frameDisplacements_.resize(static_cast<std::size_t>(frameCount_));
+  *frameDisplacements_ = member_displacements(stabilizerGlobal, windows, parameters);
+  frameDisplacements_->resize(static_cast<std::size_t>(frameCount_));
 }
 
 void CPWarper::pruneDisplacements(std::int32_t lastFrame) {
-  refresh_targets(frameDisplacements_, *solving_, std::max(lastFrame - kOutlierRampFrames, 0),
+  refresh_targets(*frameDisplacements_, *solving_, std::max(lastFrame - kOutlierRampFrames, 0),
                   lastFrame + 1);
 }
 
 void CPWarper::reweightRecent(std::int32_t lastFrame) {
   const std::int32_t first = std::max(lastFrame - kOutlierRampFrames, 0);
-  for (std::int32_t f = first; f <= lastFrame; ++f) medianDeviation(frameDisplacements_[f]);
-  fade_about_outliers(frameDisplacements_, first, lastFrame + 1, kOutlierRampFrames);
+  for (std::int32_t f = first; f <= lastFrame; ++f) medianDeviation((*frameDisplacements_)[f]);
+  fade_about_outliers(*frameDisplacements_, first, lastFrame + 1, kOutlierRampFrames);
 }
 
 void CPWarper::projectFrame(std::int32_t frame, bool translationOnly) {
-  const std::vector<Displacement>& list = frameDisplacements_[frame];
+  const std::vector<Displacement>& list = (*frameDisplacements_)[frame];
   if (list.size() < kLeastForProjection) {
     throw std::runtime_error("Not enough features for computing similarity transform");
   }
@@ -130,7 +131,7 @@ void CPWarper::projectFrame(std::int32_t frame, bool translationOnly) {
 }
 
 matrix3 CPWarper::fitKind(std::size_t frame, int kind) {
-  const std::vector<Displacement>& list = frameDisplacements_[frame];
+  const std::vector<Displacement>& list = (*frameDisplacements_)[frame];
   switch (kind) {
     case 1: {
       tessel::debug::Log("translation ");
@@ -156,7 +157,7 @@ CPWarper::frame_model CPWarper::chooseModel(std::size_t frame) {
   const int kind = static_cast<int>(std::floor(score + kWholeScore));
   tessel::debug::Log(
       "frame %d: displacements %d, models %d, score %1.2f: ", static_cast<int>(frame),
-      static_cast<int>(frameDisplacements_[frame].size()), whole ? 1 : 2, score);
+      static_cast<int>((*frameDisplacements_)[frame].size()), whole ? 1 : 2, score);
   const double share = whole ? 0 : score - kind;
   const int most_complex = whole ? kind : kind + 1;
 
@@ -165,7 +166,7 @@ CPWarper::frame_model CPWarper::chooseModel(std::size_t frame) {
   if (most_complex >= 4) {
     // The models 3 and 4 have the same base, so the blend of their bases is that base.
     if (!whole) tessel::debug::Log("cp warp ");
-    if (suffices(model.base, frameDisplacements_[frame])) {
+    if (suffices(model.base, (*frameDisplacements_)[frame])) {
       tessel::debug::Log("but homography suffices, switching");
     } else {
       model.solved_share = whole ? 1 : share;
@@ -217,7 +218,7 @@ void CPWarper::drive(const progress_functor& progress) {
   grid_solver solver(grid_.cols, grid_.rows);
   frameWarps_.reserve(static_cast<std::size_t>(frameCount_));
   for (std::size_t f = 0; f < static_cast<std::size_t>(frameCount_); ++f) {
-    std::vector<Displacement>& list = frameDisplacements_[f];
+    std::vector<Displacement>& list = (*frameDisplacements_)[f];
     const frame_model model = chooseModel(f);
     progress();
     boost::shared_ptr<VarVector> record = gridUnder(model.base);

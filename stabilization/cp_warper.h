@@ -1,5 +1,6 @@
 #pragma once
 
+#include <boost/make_shared.hpp>
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <vector>
@@ -39,6 +40,7 @@ class CPWarper {
   static constexpr std::int32_t kOutlierRampFrames = 60;  // from weight 0 to 1 along a track
 
   CPWarper(std::int32_t frameCount, std::int32_t frameWidth, std::int32_t frameHeight);
+  CPWarper& operator=(const CPWarper&) = delete;
 
   // Makes every frame's displacements and decides its model. Keeps stabilizerGlobal alive:
   // displacements point into it. Throws std::runtime_error "Homograph is not consistent with
@@ -71,6 +73,10 @@ class CPWarper {
   // the map as it was.
   void makeFrameMap(
       std::uint32_t radius, const progress_functor& progress = [] {});
+  // The same warps with a map of that radius, beside this object, which others may be reading. A
+  // warper that was read from a project knows no tracks: it keeps the map it has.
+  boost::shared_ptr<CPWarper> withFrameMap(
+      std::uint32_t radius, const progress_functor& progress = [] {}) const;
   const boost::shared_ptr<const MtoNMap>& frameMap() const { return frameMap_; }
   void setFrameMap(boost::shared_ptr<const MtoNMap> map) { frameMap_ = std::move(map); }
 
@@ -94,7 +100,7 @@ class CPWarper {
   // After drive() the sources are the images under the frame's base matrix. Empty in a warper that
   // was read from a project.
   const std::vector<Displacement>& displacements(std::size_t frame) const {
-    return frameDisplacements_[frame];
+    return (*frameDisplacements_)[frame];
   }
   double modelScore(std::size_t frame) const { return modelScore_[frame]; }
 
@@ -115,6 +121,8 @@ class CPWarper {
   bool boundsEmpty() const;
 
  private:
+  CPWarper(const CPWarper&) = default;
+
   // One frame's model: a base motion, and how far to go from it to the solved grid.
   struct frame_model {
     matrix3 base = identity3;
@@ -143,7 +151,9 @@ class CPWarper {
 
   boost::shared_ptr<const stabilizer_global> global_;
   stabilizer_global* solving_ = nullptr;  // set by buildDisplacementsForWindows alone
-  displacement_lists frameDisplacements_;
+  // Shared with the warpers that withFrameMap makes, none of which write it.
+  boost::shared_ptr<displacement_lists> frameDisplacements_ =
+      boost::make_shared<displacement_lists>();
   std::vector<double> modelScore_;
   std::vector<bool> overrideFlags_;     // the frame's similarity is stored, not to be fitted
   std::vector<double> overrideParams_;  // four a frame: scale, angle, tx, ty

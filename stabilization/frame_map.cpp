@@ -35,8 +35,8 @@ bool CPWarper::alignFrameMtoN(std::int32_t M, std::int32_t N,
     throw std::runtime_error(
         "alignFrameMtoN can't be called because CPWarper needs drive() called first");
   }
-  if (N < 0 || N >= frameCount_ || frameDisplacements_[N].empty()) return false;
-  const std::vector<Displacement>& all = frameDisplacements_[N];
+  if (N < 0 || N >= frameCount_ || (*frameDisplacements_)[N].empty()) return false;
+  const std::vector<Displacement>& all = (*frameDisplacements_)[N];
   std::vector<Displacement> shared = all;
   for (std::size_t i = 0; i < shared.size();) {
     Displacement& d = shared[i];
@@ -83,6 +83,13 @@ void CPWarper::makeFrameMap(std::uint32_t radius, const progress_functor& progre
   constexpr std::uint32_t kMost = std::numeric_limits<std::int32_t>::max();
   frameMap_ = boost::make_shared<const MtoNMap>(
       frameCount_, static_cast<std::int32_t>(std::min(radius, kMost)), *this, progress);
+}
+
+boost::shared_ptr<CPWarper> CPWarper::withFrameMap(std::uint32_t radius,
+                                                   const progress_functor& progress) const {
+  const boost::shared_ptr<CPWarper> warper(new CPWarper(*this));
+  if (driven_) warper->makeFrameMap(radius, progress);
+  return warper;
 }
 
 MtoNMap::MtoNMap(std::int32_t frameCount, std::int32_t radius, const CPWarper& warper,

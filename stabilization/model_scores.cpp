@@ -50,7 +50,7 @@ void CPWarper::computeModelScores(const std::vector<factorization_window>& windo
 
   std::vector<double> weights(frames, 0.0);
   for (std::size_t f = 0; f < frames; ++f) {
-    for (const Displacement& d : frameDisplacements_[f]) weights[f] += d.weight;
+    for (const Displacement& d : (*frameDisplacements_)[f]) weights[f] += d.weight;
     modelScore_[f] = weights[f] >= kLeastWeightSum ? std::min(methodLevel, kMostComplexScore) : 0.0;
   }
 
@@ -80,7 +80,7 @@ void CPWarper::computeModelScores(const std::vector<factorization_window>& windo
 
 void CPWarper::checkConsistency(std::size_t frame) const {
   const matrix3 stored = storedSimilarity(frame);
-  for (const Displacement& d : frameDisplacements_[frame]) {
+  for (const Displacement& d : (*frameDisplacements_)[frame]) {
     const double dx = d.targetX - (stored[0] * d.sourceX + stored[1] * d.sourceY + stored[2]);
     const double dy = d.targetY - (stored[3] * d.sourceX + stored[4] * d.sourceY + stored[5]);
     if (std::fabs(dx) <= kConsistency && std::fabs(dy) <= kConsistency) continue;
@@ -97,22 +97,22 @@ matrix3 CPWarper::storedSimilarity(std::size_t frame) const {
 }
 
 void CPWarper::limitByDeviation(const progress_functor& progress) {
-  for (std::size_t f = 0; f < frameDisplacements_.size(); ++f) {
+  for (std::size_t f = 0; f < frameDisplacements_->size(); ++f) {
     progress();
-    const double median = medianDeviation(frameDisplacements_[f]);
+    const double median = medianDeviation((*frameDisplacements_)[f]);
     if (median / frameWidth_ > kLargestDeviation && modelScore_[f] > kSimilarityScore) {
       modelScore_[f] = kSimilarityScore;
       tessel::debug::Log("Limiting frame %d to similarity, too high median deviation\n",
                          static_cast<int>(f));
     }
   }
-  fade_about_outliers(frameDisplacements_, 0, frameCount_, kOutlierRampFrames, progress);
+  fade_about_outliers(*frameDisplacements_, 0, frameCount_, kOutlierRampFrames, progress);
 }
 
 void CPWarper::limitByHomographySanity(const progress_functor& progress) {
   homography_fitter homography;
-  for (std::size_t f = 0; f < frameDisplacements_.size(); ++f) {
-    const std::vector<Displacement>& list = frameDisplacements_[f];
+  for (std::size_t f = 0; f < frameDisplacements_->size(); ++f) {
+    const std::vector<Displacement>& list = (*frameDisplacements_)[f];
     if (list.size() <= kMostEntriesExemptFromSanity) continue;
     progress();
     const double error = entry_distance(fitSimilarity(list), homography.fit(list));

@@ -3,13 +3,14 @@
 #include <array>
 #include <optional>
 
-#include "stabilization/matrix3.h"
-
 // The pinhole camera. World and camera axes: x right, y down, z forward, metres. Pixels: the centre
 // of the top-left one is (0, 0).
 namespace synthetic {
 
-using marrow::stabilization::point2;
+struct point2 {
+  double x;
+  double y;
+};
 using vector3 = std::array<double, 3>;
 using rotation3 = std::array<double, 9>;  // row-major
 

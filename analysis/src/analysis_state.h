@@ -53,7 +53,10 @@ class AnalysisState {
   tessel::utility::Guid deletion_identity;  // of the tracks that the user deleted
 
   bool analysis_pending = false;
+  // From the start of an analysis until what is made from its results is done once.
   bool first_analysis = false;
+  // A render's copy of the state of another instance, whose jobs it leaves alone.
+  bool keep_jobs = false;
   // The Detailed Analysis control that the analysis was begun with.
   boost::logic::tribool detailed = boost::logic::indeterminate;
   tessel::utility::Guid button_identity;  // of what the two buttons show

@@ -3,11 +3,11 @@
 #include <boost/make_shared.hpp>
 #include <utility>
 
-#include "analysis/src/host_access.h"
 #include "analysis/src/identities.h"
 #include "analysis/src/job_frame_source.h"
 #include "analysis/src/param_fields.h"
 #include "analysis/src/read_job_input.h"
+#include "effect/host_text.h"
 #include "platform/tessel/config.h"
 #include "platform/tessel/debug.h"
 
@@ -85,7 +85,8 @@ bool Analyzer::ReportFailure(HX_InData* host_in, HX_OutData* host_out) {
   if (GetStatus().state != JobState::Failed) return false;
   const std::string literal = GetErrorText();
   if (!literal.empty()) {
-    ShowMessage(host_in, host_out, tessel::config::Localizer::Localize(literal));
+    kelp::effect::ShowMessage(kelp::effect::RecordsOnly(host_in, host_out),
+                              tessel::config::Localizer::Localize(literal).c_str());
   }
   return true;
 }

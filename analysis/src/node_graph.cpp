@@ -3,7 +3,12 @@
 #include <charconv>
 #include <utility>
 
+#include "effect/host_text.h"
+
 namespace kelp::analysis {
+
+using effect::ThrowIfFailed;
+
 namespace {
 
 class SegmentsReference {
@@ -90,7 +95,7 @@ HX_Guid NodeGraph::NodeGuid(HX_Node node) const {
 std::string NodeGraph::OperatorText(HX_Node effect_operator) const {
   HX_String text = nullptr;
   ThrowIfFailed(segments_.GetOperatorText(effect_operator, &text));
-  return TakeText(text);
+  return effect::TakeText(strings_, text);
 }
 
 std::int64_t NodeGraph::NumberProperty(HX_Node node, const char* key, bool* absent) const {
@@ -98,20 +103,11 @@ std::int64_t NodeGraph::NumberProperty(HX_Node node, const char* key, bool* abse
   const bool failed = segments_.GetProperty(node, key, &string) != HX_ERR_NONE;
   if (absent != nullptr) *absent = failed;
   if (failed) return 0;
-  const std::string text = TakeText(string);
+  const std::string text = effect::TakeText(strings_, string);
   const char* const end = text.data() + text.size();
   std::int64_t value = 0;
   const auto [stop, error] = std::from_chars(text.data(), end, value);
   return error == std::errc() && stop == end ? value : 0;
-}
-
-std::string NodeGraph::TakeText(HX_String string) const {
-  const char* bytes = nullptr;
-  const HX_Err code = strings_.GetUTF8(string, &bytes);
-  const std::string text = code == HX_ERR_NONE && bytes != nullptr ? bytes : "";
-  strings_.Dispose(string);
-  ThrowIfFailed(code);
-  return text;
 }
 
 }  // namespace kelp::analysis

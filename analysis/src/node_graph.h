@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <string>
 
-#include "analysis/src/host_access.h"
+#include "effect/suite.h"
 
 namespace kelp::analysis {
 
@@ -48,8 +48,6 @@ class NodeGraph {
   std::int64_t NumberProperty(HX_Node node, const char* key, bool* absent = nullptr) const;
 
  private:
-  std::string TakeText(HX_String text) const;
-
   const HX_VideoSegmentSuite5& segments_;
   const HX_StringSuite1& strings_;
 };

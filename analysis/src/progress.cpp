@@ -5,7 +5,7 @@
 #include <limits>
 
 #include "analysis/src/analysis_state.h"
-#include "analysis/src/host_access.h"
+#include "effect/host_text.h"
 #include "platform/tessel/config.h"
 #include "platform/tessel/utility.h"
 
@@ -97,9 +97,10 @@ std::string GetProgressText(AnalysisState& state, HX_InData* host_in, HX_OutData
       NextProgress(state.progress, analyzer.FirstFrame(), analyzer.EndFrame(), position,
                    HighPrecisionTime::Now());
 
-  char format[kHostTextSize];
-  ConvertToHostText(host_in, host_out,
-                    tessel::config::Localizer::LocalizeUTF16(Literal(message.kind)), format);
+  char format[effect::kHostTextSize];
+  effect::ConvertToHostText(effect::RecordsOnly(host_in, host_out),
+                            tessel::config::Localizer::LocalizeUTF16(Literal(message.kind)),
+                            format);
   char text[kTextSize];
   if (message.kind == ProgressKind::Frames) {
     const char* const no_suffix = "";

@@ -2,30 +2,34 @@
 
 #include <algorithm>
 
-#include "analysis/src/host_access.h"
+#include "effect/host_text.h"
+#include "effect/suite.h"
 
 namespace kelp::analysis {
+
+using effect::ScopedSuite;
+using effect::ThrowIfFailed;
+
 namespace {
 
-void ThrowIfRefused(HX_InData* host_in, HX_OutData* host_out) {
-  const ScopedSuite<HX_AnalysisHostSuite1> suite(host_in, host_out, HX_ANALYSIS_HOST_SUITE,
-                                                 HX_ANALYSIS_HOST_SUITE_VERSION);
-  std::uint16_t units[kHostUnits] = {};
-  ThrowIfFailed(suite->GetRefusal(host_in->effect_ref, units, kHostUnits));
-  const std::u16string reason = UnitsToText(units);
+void ThrowIfRefused(const effect::HostContext& context) {
+  const ScopedSuite<HX_AnalysisHostSuite1> suite(context);
+  std::uint16_t units[effect::kHostUnits] = {};
+  ThrowIfFailed(suite->GetRefusal(context.in->effect_ref, units, effect::kHostUnits));
+  const std::u16string reason = effect::UnitsToText(units);
   if (reason.empty()) return;
-  char message[kHostTextSize];
-  ConvertToHostText(host_in, host_out, reason, message);
-  ShowMessage(host_in, host_out, message);
+  char message[effect::kHostTextSize];
+  effect::ConvertToHostText(context, reason, message);
+  effect::ShowMessage(context, message);
   throw std::int32_t{HX_ERR_LAYER_REFUSED};
 }
 
 }  // namespace
 
 JobInput ReadJobInput(HX_InData* host_in, HX_OutData* host_out) {
-  ThrowIfRefused(host_in, host_out);
-  const ScopedSuite<HX_UtilitySuite> suite(host_in, host_out, HX_UTILITY_SUITE,
-                                           HX_UTILITY_SUITE_VERSION_3);
+  const effect::HostContext context = effect::RecordsOnly(host_in, host_out);
+  ThrowIfRefused(context);
+  const ScopedSuite<HX_UtilitySuite> suite(context, HX_UTILITY_SUITE_VERSION_3);
   std::int32_t start = 0, count = 0;
   std::int64_t ticks = 0;
   JobInput input;

@@ -1,6 +1,7 @@
 #include "analysis/src/state_errors.h"
 
-#include "analysis/src/host_access.h"
+#include "effect/host_text.h"
+#include "effect/suite.h"
 #include "platform/tessel/config.h"
 #include "platform/tessel/utility.h"
 
@@ -21,15 +22,15 @@ std::string SizeText(const SourceSize& size) {
 
 // A report is worth more than the name in it.
 std::string LayerName(HX_InData* host_in, HX_OutData* host_out) {
-  std::uint16_t units[kHostUnits] = {};
+  std::uint16_t units[effect::kHostUnits] = {};
   try {
-    const ScopedSuite<HX_UtilitySuite> suite(host_in, host_out, HX_UTILITY_SUITE,
-                                             HX_UTILITY_SUITE_VERSION_3);
-    ThrowIfFailed(suite->GetLayerName(host_in->effect_ref, units, kHostUnits));
+    const effect::ScopedSuite<HX_UtilitySuite> suite(effect::RecordsOnly(host_in, host_out),
+                                                     HX_UTILITY_SUITE_VERSION_3);
+    effect::ThrowIfFailed(suite->GetLayerName(host_in->effect_ref, units, effect::kHostUnits));
   } catch (std::int32_t) {
     return {};
   }
-  return tessel::utility::ToUTF8(UnitsToText(units));
+  return tessel::utility::ToUTF8(effect::UnitsToText(units));
 }
 
 }  // namespace
@@ -41,7 +42,7 @@ void ReportStateError(HX_InData* host_in, HX_OutData* host_out, const char* lite
   try {
     tessel::config::ThrowError(text, kErrorCode);
   } catch (const tessel::config::Error& error) {
-    ShowMessage(host_in, host_out, error.what());
+    effect::ShowMessage(effect::RecordsOnly(host_in, host_out), error.what());
   }
   if (after == AfterReport::Throw) throw StateDeserializationFailed(text);
 }

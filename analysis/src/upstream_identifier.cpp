@@ -3,6 +3,10 @@
 #include "analysis/src/node_graph.h"
 
 namespace kelp::analysis {
+
+using effect::ScopedSuite;
+using effect::ThrowIfFailed;
+
 namespace {
 
 using tessel::utility::Guid;
@@ -46,14 +50,11 @@ class UpstreamWalk {
 }  // namespace
 
 Guid GetUpstreamIdentifier(HX_InData* host_in, HX_OutData* host_out) {
-  const ScopedSuite<HX_VideoSegmentSuite5> segments(host_in, host_out, HX_VIDEO_SEGMENT_SUITE,
-                                                    HX_VIDEO_SEGMENT_SUITE_VERSION);
-  const ScopedSuite<HX_UtilitySuite> utility(host_in, host_out, HX_UTILITY_SUITE,
-                                             HX_UTILITY_SUITE_VERSION_3);
-  const ScopedSuite<HX_SequenceInfoSuite> sequence(host_in, host_out, HX_SEQUENCE_INFO_SUITE,
-                                                   HX_SEQUENCE_INFO_SUITE_VERSION_2);
-  const ScopedSuite<HX_StringSuite1> strings(host_in, host_out, HX_STRING_SUITE,
-                                             HX_STRING_SUITE_VERSION);
+  const effect::HostContext context = effect::RecordsOnly(host_in, host_out);
+  const ScopedSuite<HX_VideoSegmentSuite5> segments(context);
+  const ScopedSuite<HX_UtilitySuite> utility(context, HX_UTILITY_SUITE_VERSION_3);
+  const ScopedSuite<HX_SequenceInfoSuite> sequence(context, HX_SEQUENCE_INFO_SUITE_VERSION_2);
+  const ScopedSuite<HX_StringSuite1> strings(context);
   const NodeGraph graph(*segments, *strings);
   const NodeReference clip = graph.ClipNode(host_in->effect_ref, *sequence, *utility);
   if (!clip) return {};

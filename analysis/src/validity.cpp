@@ -1,6 +1,7 @@
 #include "analysis/src/validity.h"
 
 #include "analysis/src/identities.h"
+#include "effect/host_text.h"
 
 namespace kelp::analysis {
 namespace {
@@ -40,8 +41,7 @@ bool IsAnalysisCurrent(AnalysisState& state, const PresentInputs& present, HX_Ou
   try {
     return FitsInputs(state, present);
   } catch (...) {
-    host_out->out_flags &= ~std::uint32_t{HX_OUT_FLAG_SHOW_MESSAGE};
-    host_out->return_msg[0] = '\0';
+    effect::ClearMessage(effect::RecordsOnly(nullptr, host_out));
     return false;
   }
 }

@@ -7,9 +7,8 @@
 #include <vector>
 
 #include "apps/calmframe/caption.h"
-#include "apps/calmframe/progress_line.h"
+#include "apps/calmframe/failures.h"
 #include "host/media/clip.h"
-#include "platform/tessel/threads.h"
 #include "synthetic/scene.h"
 
 namespace calmframe {
@@ -25,6 +24,12 @@ media::EncodeSettings Encoding(const media::EncodeSettings& wanted) {
   return settings;
 }
 
+void End(Progress shown, ProgressLine& progress) {
+  shown.done = shown.total;
+  shown.ends = true;
+  progress.Show(shown);
+}
+
 // A walk down a street with the camera held in the hand.
 synthetic::scene Street(int frames) {
   synthetic::scene_options options;
@@ -35,7 +40,7 @@ synthetic::scene Street(int frames) {
 }
 
 void WriteSample(const std::string& path, int frames, const media::EncodeSettings& encode,
-                 pipeline::Listener& listener) {
+                 ProgressLine& progress) {
   media::ClipInfo info;
   info.width = kWidth;
   info.height = kHeight;
@@ -45,19 +50,21 @@ void WriteSample(const std::string& path, int frames, const media::EncodeSetting
   const synthetic::scene scene = Street(frames);
   std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(kWidth) * kHeight);
   constexpr std::ptrdiff_t kRowBytes = kWidth * sizeof(HX_Pixel8);
+  Progress shown{"drawing", 0, static_cast<double>(frames), "frames", "", false};
   for (int f = 0; f < frames; ++f) {
-    if (listener.Cancelled()) throw pipeline::Interrupted();
-    listener.Progress("drawing", f, frames, "frames");
+    if (InterruptAsked()) throw Interrupted();
+    shown.done = f;
+    progress.Show(shown);
     scene.render(f, pixels.data(), kWidth);
     writer->Write(static_cast<std::size_t>(f), pixels.data(), kRowBytes);
   }
   writer->Finish();
-  listener.Progress("drawing", frames, frames, "frames");
+  End(shown, progress);
 }
 
 void WriteSideBySide(const std::string& left_path, const std::string& right_path,
                      const std::string& path, const media::EncodeSettings& encode,
-                     pipeline::Listener& listener) {
+                     ProgressLine& progress) {
   const auto left = media::ClipReader::Open(left_path);
   const auto right = media::ClipReader::Open(right_path);
   media::ClipInfo info = left->info();
@@ -68,10 +75,11 @@ void WriteSideBySide(const std::string& left_path, const std::string& right_path
   std::vector<HX_Pixel8> pixels(row_pixels * static_cast<std::size_t>(info.height));
   HX_Pixel8* left_half = pixels.data();
   HX_Pixel8* right_half = left_half + width;
-  const auto frames = static_cast<double>(info.frame_count);
+  Progress shown{"pairing", 0, static_cast<double>(info.frame_count), "frames", "", false};
   for (std::size_t f = 0; f < info.frame_count; ++f) {
-    if (listener.Cancelled()) throw pipeline::Interrupted();
-    listener.Progress("pairing", static_cast<double>(f), frames, "frames");
+    if (InterruptAsked()) throw Interrupted();
+    shown.done = static_cast<double>(f);
+    progress.Show(shown);
     left->Read(f, left_half, row_bytes);
     right->Read(f, right_half, row_bytes);
     DrawCaption("SHAKY", left_half, row_pixels, width, info.height);
@@ -82,7 +90,7 @@ void WriteSideBySide(const std::string& left_path, const std::string& right_path
     writer->Write(f, pixels.data(), row_bytes);
   }
   writer->Finish();
-  listener.Progress("pairing", frames, frames, "frames");
+  End(shown, progress);
 }
 
 }  // namespace
@@ -96,11 +104,11 @@ DemoCommand::DemoCommand(CLI::App& program)
       ->capture_default_str();
   AddControlFlags(*command_, controls_);
   AddOutputFlags(*command_, flags_);
+  AddRunFlags(*command_, run_);
 }
 
 void DemoCommand::Run() {
-  const tessel::threads::ProcessorLimit limit(flags_.threads);
-  ProgressLine progress(flags_.quiet);
+  ProgressLine progress(run_.progress_form());
   std::error_code error;
   std::filesystem::create_directories(directory_, error);
   if (error) {
@@ -110,15 +118,13 @@ void DemoCommand::Run() {
   const std::string shaky = directory / "shaky.mp4";
   const std::string steady = directory / "steady.mp4";
   const std::string both = directory / "side-by-side.mp4";
-  const media::EncodeSettings encode = Encoding(flags_.output.encode);
+  OutputFlags flags = flags_;
+  flags.encode = Encoding(flags_.encode);
 
-  WriteSample(shaky, frames_, encode, progress);
-  pipeline::Output output = flags_.output;
-  output.path = steady;
-  output.encode = encode;
-  pipeline::Stabilize(shaky, controls_, output, progress);
-  WriteSideBySide(shaky, steady, both, encode, progress);
-  if (!flags_.quiet) {
+  WriteSample(shaky, frames_, flags.encode, progress);
+  Stabilize(shaky, steady, controls_, flags, run_.threads, progress);
+  WriteSideBySide(shaky, steady, both, flags.encode, progress);
+  if (run_.progress_form() == ProgressLine::Form::line) {
     std::fprintf(stderr, "wrote %s, %s and %s\n", shaky.c_str(), steady.c_str(), both.c_str());
   }
 }

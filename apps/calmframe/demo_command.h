@@ -13,14 +13,16 @@ class DemoCommand {
  public:
   explicit DemoCommand(CLI::App& program);
   bool chosen() const { return command_->parsed(); }
+  bool json() const { return run_.json; }
   void Run();
 
  private:
   CLI::App* const command_;
   std::string directory_ = "calmframe-demo";
   int frames_ = 240;
-  kelp::effect::Controls controls_;
+  ControlFlags controls_;
   OutputFlags flags_;
+  RunFlags run_;
 };
 
 }  // namespace calmframe

@@ -2,16 +2,19 @@
 #include <cstdio>
 #include <exception>
 #include <new>
+#include <nlohmann/json.hpp>
 #include <string>
 #include <vector>
 
+#include "apps/calmframe/analyze_command.h"
 #include "apps/calmframe/demo_command.h"
 #include "apps/calmframe/exit_codes.h"
+#include "apps/calmframe/failures.h"
 #include "apps/calmframe/nearest_match.h"
+#include "apps/calmframe/params_command.h"
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/stabilize_command.h"
 #include "host/media/clip.h"
-#include "pipeline/stabilize.h"
 
 namespace calmframe {
 namespace {
@@ -28,12 +31,18 @@ std::vector<std::string> KnownNames(const CLI::App& program) {
   return names;
 }
 
-int Fail(ExitCode code, const std::string& line) {
-  std::fprintf(stderr, "calmframe: %s\n", line.c_str());
+int Fail(ExitCode code, const std::string& line, bool json = false) {
+  if (json) {
+    const nlohmann::ordered_json object = {{"error", line}, {"exit_code", code}};
+    std::fprintf(stderr, "%s\n",
+                 object.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace).c_str());
+  } else {
+    std::fprintf(stderr, "calmframe: %s\n", line.c_str());
+  }
   return code;
 }
 
-int UsageFailure(const CLI::App& program, const CLI::ParseError& error, int argc, char** argv) {
+int FailUsage(const CLI::App& program, const CLI::ParseError& error, int argc, char** argv) {
   std::string line = error.what();
   for (char& c : line) {
     if (c == '\n') c = ' ';
@@ -58,29 +67,37 @@ int Run(int argc, char** argv) {
   program.require_subcommand(1);
   StabilizeCommand stabilize(program);
   DemoCommand demo(program);
+  AnalyzeCommand analyze(program);
+  ParamsCommand params(program);
   try {
     program.parse(argc, argv);
   } catch (const CLI::Success& success) {
     return program.exit(success);
   } catch (const CLI::ParseError& error) {
-    return UsageFailure(program, error, argc, argv);
+    return FailUsage(program, error, argc, argv);
   }
 
+  const bool json = stabilize.json() || demo.json() || analyze.json();
   CatchInterrupts();
   try {
     if (stabilize.chosen()) stabilize.Run();
     if (demo.chosen()) demo.Run();
+    if (analyze.chosen()) analyze.Run();
+    if (params.chosen()) params.Run();
     return kDone;
-  } catch (const pipeline::Interrupted&) {
-    return Fail(kInterrupted, "interrupted; nothing was written");
+  } catch (const UsageFailure& failure) {
+    return Fail(kUsage, failure.what(), json);
+  } catch (const Interrupted&) {
+    return Fail(kInterrupted, "interrupted; nothing was written", json);
   } catch (const media::Failure& failure) {
-    return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what());
-  } catch (const pipeline::SolveFailure& failure) {
-    return Fail(kSolveFailed, failure.what());
+    return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what(),
+                json);
+  } catch (const SolveFailure& failure) {
+    return Fail(kSolveFailed, failure.what(), json);
   } catch (const std::bad_alloc&) {
-    return Fail(kSolveFailed, "out of memory");
+    return Fail(kSolveFailed, "out of memory", json);
   } catch (const std::exception& error) {
-    return Fail(kSolveFailed, error.what());
+    return Fail(kSolveFailed, error.what(), json);
   }
 }
 

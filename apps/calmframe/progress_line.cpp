@@ -6,6 +6,7 @@
 #include <cmath>
 #include <csignal>
 #include <cstdio>
+#include <nlohmann/json.hpp>
 
 namespace calmframe {
 namespace {
@@ -28,6 +29,11 @@ std::string Clock(double seconds) {
   return text;
 }
 
+double ShareOf(const Progress& progress) {
+  if (progress.ends) return 1;
+  return progress.total > 0 ? std::clamp(progress.done / progress.total, 0.0, 1.0) : 0;
+}
+
 }  // namespace
 
 void CatchInterrupts() {
@@ -39,61 +45,87 @@ bool InterruptAsked() {
   return interrupt_asked != 0;
 }
 
-std::string ProgressText(const std::string& stage, double done, double total,
-                         const std::string& unit, double elapsed_seconds) {
-  const double share = total > 0 ? std::clamp(done / total, 0.0, 1.0) : 1.0;
-  char text[160];
-  int length = std::snprintf(text, sizeof text, "%-10s %3.0f %%", stage.c_str(), 100 * share);
+std::string ProgressText(const Progress& progress, double elapsed_seconds) {
+  const double share = ShareOf(progress);
+  char text[256];
+  int length = std::snprintf(text, sizeof text, "%-10s ", progress.stage.c_str());
   const auto add = [&](const auto&... values) {
-    length +=
-        std::snprintf(text + length, sizeof text - static_cast<std::size_t>(length), values...);
+    const std::size_t room = sizeof text - static_cast<std::size_t>(length);
+    length += std::min(std::snprintf(text + length, room, values...), static_cast<int>(room) - 1);
   };
-  if (!unit.empty()) {
-    add("  %.0f/%.0f %s", done, total, unit.c_str());
-    if (done > 0 && elapsed_seconds > 0) add("  %.1f %s/s", done / elapsed_seconds, unit.c_str());
+  const bool counts = !progress.unit.empty() && progress.total > 0;
+  const bool says = !progress.says.empty() && !progress.ends;
+  if (says) {
+    add("%s", progress.says.c_str());
+  } else {
+    add("%3.0f %%", 100 * share);
+    if (counts) add("  %.0f/%.0f %s", progress.done, progress.total, progress.unit.c_str());
   }
-  if (share >= 1.0) {
+  if (counts && progress.done > 0 && elapsed_seconds > 0) {
+    add("  %.1f %s/s", progress.done / elapsed_seconds, progress.unit.c_str());
+  }
+  if (progress.ends) {
     add("  in %s", Clock(elapsed_seconds).c_str());
-  } else if (share > 0.0) {
+  } else if (share > 0.0 && share < 1.0) {
     add("  %s left", Clock(elapsed_seconds * (1 - share) / share).c_str());
   }
   return text;
 }
 
-ProgressLine::ProgressLine(bool quiet) : quiet_(quiet), terminal_(isatty(STDERR_FILENO) != 0) {}
+std::string ProgressJson(const Progress& progress, double elapsed_seconds) {
+  nlohmann::ordered_json json;
+  json["stage"] = progress.stage;
+  if (progress.ends || progress.total > 0) json["share"] = ShareOf(progress);
+  if (!progress.unit.empty() && progress.total > 0) {
+    json["done"] = progress.done;
+    json["total"] = progress.total;
+    json["unit"] = progress.unit;
+  }
+  if (!progress.says.empty()) json["says"] = progress.says;
+  json["elapsed"] = std::round(elapsed_seconds * 1000) / 1000;
+  return json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
+}
+
+ProgressLine::ProgressLine(Form form) : form_(form), terminal_(isatty(STDERR_FILENO) != 0) {}
 
 ProgressLine::~ProgressLine() {
   if (line_open_) std::fputc('\n', stderr);
 }
 
-void ProgressLine::Progress(const char* stage, double done, double total, const char* unit) {
-  if (quiet_) return;
+void ProgressLine::Show(const Progress& progress) {
+  if (form_ == Form::none) return;
   const auto now = std::chrono::steady_clock::now();
-  const bool begins = stage_ != stage;
-  const bool ends = done >= total;
+  const bool begins = stage_ != progress.stage;
   if (begins) {
-    stage_ = stage;
+    stage_ = progress.stage;
     stage_begin_ = now;
   }
   constexpr std::chrono::milliseconds kBetween(100);  // faster than that nobody reads
-  if (!begins && !ends && (!terminal_ || now - last_shown_ < kBetween)) return;
+  const bool flows = terminal_ || form_ == Form::json;
+  if (!begins && !progress.ends && (!flows || now - last_shown_ < kBetween)) return;
   last_shown_ = now;
   const double elapsed = std::chrono::duration<double>(now - stage_begin_).count();
-  Show(ProgressText(stage, done, total, unit, elapsed), ends);
-  if (ends) stage_.clear();
-}
-
-bool ProgressLine::Cancelled() {
-  return InterruptAsked();
+  if (form_ == Form::json) {
+    std::fprintf(stderr, "%s\n", ProgressJson(progress, elapsed).c_str());
+  } else {
+    Write(ProgressText(progress, elapsed), progress.ends);
+  }
+  if (progress.ends) stage_.clear();
 }
 
 void ProgressLine::Warn(const std::string& line) {
   if (line_open_) std::fputc('\n', stderr);
   line_open_ = false;
-  std::fprintf(stderr, "calmframe: %s\n", line.c_str());
+  if (form_ == Form::json) {
+    const nlohmann::json json = {{"warning", line}};
+    std::fprintf(stderr, "%s\n",
+                 json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace).c_str());
+  } else {
+    std::fprintf(stderr, "calmframe: %s\n", line.c_str());
+  }
 }
 
-void ProgressLine::Show(const std::string& text, bool last) {
+void ProgressLine::Write(const std::string& text, bool last) {
   if (terminal_) {
     std::fprintf(stderr, "\r%s\033[K%s", text.c_str(), last ? "\n" : "");
     line_open_ = !last;

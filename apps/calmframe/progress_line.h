@@ -3,25 +3,35 @@
 #include <chrono>
 #include <string>
 
-#include "pipeline/stabilize.h"
-
 namespace calmframe {
 
-// Shows a stage's share, speed and time left: on a terminal one line that is written over,
-// elsewhere a line at the start and the end of each stage. Watches Ctrl-C.
-class ProgressLine final : public pipeline::Listener {
- public:
-  explicit ProgressLine(bool quiet);
-  ~ProgressLine() override;
+// How far a stage has come.
+struct Progress {
+  std::string stage;
+  double done = 0, total = 0;  // total 0: nobody knows
+  std::string unit;            // of both; empty for a mere share
+  std::string says;            // what the effect shows its user meanwhile; may be empty
+  bool ends = false;
+};
 
-  void Progress(const char* stage, double done, double total, const char* unit) override;
-  bool Cancelled() override;
-  void Warn(const std::string& line) override;
+// Shows progress on the standard error: on a terminal one line that is written over, elsewhere a
+// line at the start and the end of each stage; or, for programs, one JSON object a line.
+class ProgressLine {
+ public:
+  enum class Form { none, line, json };
+  explicit ProgressLine(Form form);
+  ~ProgressLine();
+  ProgressLine(const ProgressLine&) = delete;
+  ProgressLine& operator=(const ProgressLine&) = delete;
+
+  void Show(const Progress& progress);
+  // One line that the user should see, in every form.
+  void Warn(const std::string& line);
 
  private:
-  void Show(const std::string& text, bool last);
+  void Write(const std::string& text, bool last);
 
-  const bool quiet_;
+  const Form form_;
   const bool terminal_;
   std::string stage_;
   std::chrono::steady_clock::time_point stage_begin_;
@@ -30,9 +40,11 @@ class ProgressLine final : public pipeline::Listener {
 };
 
 // One line of a stage, without a newline: "rendering   42 %  126/300 frames  18.3 frames/s  0:09
-// left".
-std::string ProgressText(const std::string& stage, double done, double total,
-                         const std::string& unit, double elapsed_seconds);
+// left". What the effect says takes the place of the numbers that it tells.
+std::string ProgressText(const Progress& progress, double elapsed_seconds);
+// The same as a JSON object: "stage", "elapsed" in seconds, and what is known of "share" (0 to 1),
+// "done", "total", "unit", "says".
+std::string ProgressJson(const Progress& progress, double elapsed_seconds);
 
 // From now on the first Ctrl-C (or SIGTERM) asks the running stage to end; a second one ends the
 // program at once.

@@ -3,33 +3,51 @@
 #include <CLI/CLI.hpp>
 #include <string>
 
-#include "pipeline/stabilize.h"
+#include "apps/calmframe/controls.h"
+#include "apps/calmframe/progress_line.h"
+#include "host/media/clip.h"
 
 namespace calmframe {
 
-// Adds the controls, each under its own name, to a command.
-void AddControlFlags(CLI::App& command, kelp::effect::Controls& controls);
-
-// Adds how the result is written.
-struct OutputFlags {
-  pipeline::Output output;
+// How much a command tells, and how many processors it uses.
+struct RunFlags {
   int threads = 0;  // 0: all processors
   bool quiet = false;
+  bool json = false;
+
+  ProgressLine::Form progress_form() const {
+    return json    ? ProgressLine::Form::json
+           : quiet ? ProgressLine::Form::none
+                   : ProgressLine::Form::line;
+  }
+};
+void AddRunFlags(CLI::App& command, RunFlags& flags);
+
+// How the result is written.
+struct OutputFlags {
+  media::EncodeSettings encode;
+  int depth = 0;  // see RenderClip
 };
 void AddOutputFlags(CLI::App& command, OutputFlags& flags);
+
+// From a file to a file. Throws media::Failure, UsageFailure, SolveFailure, Interrupted.
+void Stabilize(const std::string& input, const std::string& output, const ControlFlags& controls,
+               const OutputFlags& flags, int threads, ProgressLine& progress);
 
 // `calmframe stabilize IN OUT`. Added to the program's parser; runs when that has chosen it.
 class StabilizeCommand {
  public:
   explicit StabilizeCommand(CLI::App& program);
   bool chosen() const { return command_->parsed(); }
+  bool json() const { return run_.json; }
   void Run();
 
  private:
   CLI::App* const command_;
-  std::string input_;
-  kelp::effect::Controls controls_;
+  std::string input_, output_;
+  ControlFlags controls_;
   OutputFlags flags_;
+  RunFlags run_;
 };
 
 }  // namespace calmframe

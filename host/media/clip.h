@@ -73,6 +73,10 @@ class ClipReader {
   static std::unique_ptr<ClipReader> Open(const std::string& path);
   virtual ~ClipReader() = default;
 
+  // Another reader of the clip, with a place of its own. One of a file doesn't search it again for
+  // its frames. Throws Failure (input).
+  virtual std::unique_ptr<ClipReader> Again() const { return Open(info().path); }
+
   virtual const ClipInfo& info() const = 0;
 
   // Writes frame `frame` into info().height rows of info().width pixels, row_bytes apart, alpha as

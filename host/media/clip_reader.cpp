@@ -19,9 +19,17 @@ class FfmpegReader final : public ClipReader {
   explicit FfmpegReader(const std::string& path) : to_pixels_(info_) {
     {
       Decoder decoder(path);
-      index_ = ScanFrames(path, decoder, info_);
+      index_ = std::make_shared<const FrameIndex>(ScanFrames(path, decoder, info_));
     }
-    finder_.emplace(path, index_);
+    finder_.emplace(path, *index_);
+  }
+  FfmpegReader(const ClipInfo& info, std::shared_ptr<const FrameIndex> index)
+      : info_(info), index_(std::move(index)), to_pixels_(info_) {
+    finder_.emplace(info_.path, *index_);
+  }
+
+  std::unique_ptr<ClipReader> Again() const override {
+    return std::make_unique<FfmpegReader>(info_, index_);
   }
 
   const ClipInfo& info() const override { return info_; }
@@ -74,7 +82,7 @@ class FfmpegReader final : public ClipReader {
   }
 
   ClipInfo info_;
-  FrameIndex index_;
+  std::shared_ptr<const FrameIndex> index_;
   FrameToPixels to_pixels_;
   std::optional<FrameFinder> finder_;
   FramePtr last_;

@@ -7,6 +7,7 @@
 #include <atomic>
 #include <thread>
 
+#include "platform/tessel/shutdown.h"
 #include "platform/tessel/threads_internal.h"
 
 namespace tessel::threads {
@@ -159,3 +160,7 @@ bool CompletionEvent::WaitFor(std::chrono::milliseconds time) {
 }
 
 }  // namespace tessel::threads
+
+extern "C" void tessel_shutdown(void) {
+  tessel::threads::Shutdown();
+}

@@ -62,6 +62,8 @@ HX_Err Lend(const char* operation, const std::vector<int>& from, int index, HX_N
 const HX_AnalysisHostSuite1& AnalysisSuite() {
   static const HX_AnalysisHostSuite1 suite = [] {
     HX_AnalysisHostSuite1 table{};
+    table.MayStart = [](HX_EffectRef, uint8_t* may) { return Answer("MayStart", may, 1); };
+    table.ScheduleAnalysis = [](HX_EffectRef) { return Called("ScheduleAnalysis"); };
     table.GetRefusal = [](HX_EffectRef, uint16_t* text, uint32_t max) {
       return AnswerText("GetRefusal", host->refusal, text, max);
     };
@@ -114,6 +116,9 @@ const HX_PrivateEffectSuite3& PrivateSuite() {
 const HX_StringSuite1& StringSuite() {
   static const HX_StringSuite1 suite = [] {
     HX_StringSuite1 table{};
+    table.MakeFromUTF8 = [](const char* text, HX_String* string) {
+      return AnswerString("MakeFromUTF8", text, string);
+    };
     table.GetUTF8 = [](HX_String string, const char** text) {
       return Answer("GetUTF8", text, string->text.c_str());
     };
@@ -190,18 +195,13 @@ const HX_VideoSegmentSuite5& SegmentSuite() {
 }
 
 HX_Err Acquire(const char* name, int32_t version, const void** table) {
-  const std::map<std::pair<std::string, int32_t>, const void*> tables = {
-      {{"Analysis Host Suite", 1}, &AnalysisSuite()},
-      {{"HX Utility Suite", 3}, &UtilitySuite()},
-      {{"HX OV Private Effect Suite", 3}, &PrivateSuite()},
-      {{"Rushbase StringSuite", 1}, &StringSuite()},
-      {{"Rushbase Sequence Info Suite", 2}, &SequenceSuite()},
-      {{"Rushbase Video Segment Suite", 5}, &SegmentSuite()}};
-  const auto found = tables.find({name, version});
-  if (found == tables.end() || host->missing.count(name)) return HX_ERR_MISSING_SUITE;
-  *table = found->second;
-  ++host->suites;
-  return HX_ERR_NONE;
+  for (const FakeHost::SuiteTable& suite : FakeHost::SuiteTables()) {
+    if (suite.name != name || suite.version != version || host->missing.count(name)) continue;
+    *table = suite.table;
+    ++host->suites;
+    return HX_ERR_NONE;
+  }
+  return HX_ERR_MISSING_SUITE;
 }
 
 HX_Err Release(const char*, int32_t) {
@@ -240,6 +240,17 @@ FakeHost::~FakeHost() {
   EXPECT_EQ(strings, 0);
   EXPECT_EQ(node_references, 0);
   host = nullptr;
+}
+
+const std::vector<FakeHost::SuiteTable>& FakeHost::SuiteTables() {
+  static const std::vector<SuiteTable> tables = {
+      {"Analysis Host Suite", 1, &AnalysisSuite()},
+      {"HX Utility Suite", 3, &UtilitySuite()},
+      {"HX OV Private Effect Suite", 3, &PrivateSuite()},
+      {"Rushbase StringSuite", 1, &StringSuite()},
+      {"Rushbase Sequence Info Suite", 2, &SequenceSuite()},
+      {"Rushbase Video Segment Suite", 5, &SegmentSuite()}};
+  return tables;
 }
 
 int FakeHost::AddNode(Node node) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <map>
 #include <set>
@@ -11,7 +12,8 @@
 namespace kelp::analysis {
 
 // As much of a host as an analysis asks for: one effect on one layer, over a graph of nodes. One at
-// a time. At its end nothing that it lent may be missing.
+// a time. At its end nothing that it lent may be missing. What it offers may be called on any
+// thread, while the test changes nothing.
 class FakeHost {
  public:
   struct Node {
@@ -31,6 +33,14 @@ class FakeHost {
   // Media, this effect on it, and nothing else; the top node.
   int AddPlainClip(const std::string& media_guid);
 
+  struct SuiteTable {
+    std::string name;
+    std::int32_t version;
+    const void* table;
+  };
+  // For a host that offers more.
+  static const std::vector<SuiteTable>& SuiteTables();
+
   HX_InData in{};
   HX_OutData out{};
 
@@ -44,10 +54,10 @@ class FakeHost {
   std::int64_t asked_ticks = -1;
   std::set<std::string> missing;          // suites
   std::map<std::string, HX_Err> failing;  // operations, by name
-  int calls = 0;                          // of operations of suites
+  std::atomic<int> calls = 0;             // of operations of suites
 
   // Lent and not given back.
-  int suites = 0, segments = 0, strings = 0, node_references = 0;
+  std::atomic<int> suites = 0, segments = 0, strings = 0, node_references = 0;
 };
 
 }  // namespace kelp::analysis

@@ -10,14 +10,17 @@
 #include "effect/host_text.h"
 #include "tests/effect/fake_host.h"
 
-namespace kelp::effect {
-
+namespace kelp::analysis::effect {
 class BannerCache {
  public:
   std::string text = "a banner";
 };
+}  // namespace kelp::analysis::effect
 
+namespace kelp::effect {
 namespace {
+
+using analysis::effect::BannerCache;
 
 const char* const kLiterals[] = {
     "$$$/Test/0=Calmframe, v%d.%d#{cr}#{cr}Stabilizes footage without manual tracking.", "",

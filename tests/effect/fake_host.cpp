@@ -1,5 +1,6 @@
 #include "tests/effect/fake_host.h"
 
+#include <algorithm>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
@@ -7,6 +8,7 @@
 #include <sstream>
 
 #include "platform/tessel/utility.h"
+#include "tests/effect/fake_pixels.h"
 
 struct HX_HandleRecord {
   std::vector<unsigned char> block;
@@ -17,8 +19,16 @@ namespace {
 
 FakeHost* current = nullptr;
 
-int BytesOfPixel(std::uint32_t format) {
-  return format == HX_FORMAT_ARGBF ? 16 : format == HX_FORMAT_ARGB16 ? 8 : 4;
+// HX_Callbacks.transfer's sum of a pixel in front of another.
+FakePixel InFront(const FakePixel& s, const FakePixel& d) {
+  FakePixel sum;
+  sum.a = s.a + d.a * (1 - s.a);
+  if (sum.a == 0) return sum;
+  const double back = d.a * (1 - s.a);
+  sum.r = (s.r * s.a + d.r * back) / sum.a;
+  sum.g = (s.g * s.a + d.g * back) / sum.a;
+  sum.b = (s.b * s.a + d.b * back) / sum.a;
+  return sum;
 }
 
 }  // namespace
@@ -171,11 +181,78 @@ struct FakeHostCallbacks {
     return HX_ERR_NONE;
   }
 
+  static HX_Err RefreshAllWindows() {
+    Lock lock(current->mutex_);
+    return current->Operate("Adv App.RefreshAllWindows") ? FakeHost::kFault : HX_Err{HX_ERR_NONE};
+  }
+  static HX_Err InfoText(const char* line1, const char* line2) {
+    Lock lock(current->mutex_);
+    if (current->Operate("Adv App.InfoText")) return FakeHost::kFault;
+    current->info_text_.clear();
+    for (const char* line : {line1, line2}) {
+      if (line) current->info_text_.push_back(line);
+    }
+    return HX_ERR_NONE;
+  }
+
+  static HX_Err Transfer(HX_EffectRef, const HX_World* from, const HX_TransferMode* mode,
+                         const void* mask, std::int32_t x0, std::int32_t y0, HX_World* to) {
+    Lock lock(current->mutex_);
+    if (current->Operate("transfer")) return FakeHost::kFault;
+    if (mode->mode != HX_TRANSFER_IN_FRONT || mode->opacity != 255 || mode->opacity_u16 != 32768 ||
+        mask) {
+      return HX_ERR_UNKNOWN;
+    }
+    for (int y = std::max(0, -y0); y < from->height && y + y0 < to->height; ++y) {
+      for (int x = std::max(0, -x0); x < from->width && x + x0 < to->width; ++x) {
+        StoreFakePixel(*to, x + x0, y + y0,
+                       InFront(LoadFakePixel(*from, x, y), LoadFakePixel(*to, x + x0, y + y0)));
+      }
+    }
+    return HX_ERR_NONE;
+  }
+  // The mean of the pixels that a pixel of the copy covers, as far as they are whole.
+  static HX_Err CopyWorld(HX_EffectRef, const HX_World* from, HX_World* to,
+                          const HX_Rect* from_rect, const HX_Rect* to_rect) {
+    Lock lock(current->mutex_);
+    if (current->Operate("copy_world")) return FakeHost::kFault;
+    const HX_Rect s = from_rect ? *from_rect : HX_Rect{0, 0, from->width, from->height};
+    const HX_Rect d = to_rect ? *to_rect : HX_Rect{0, 0, to->width, to->height};
+    const int from_width = s.right - s.left, from_height = s.bottom - s.top;
+    const int to_width = d.right - d.left, to_height = d.bottom - d.top;
+    for (int y = 0; y < to_height; ++y) {
+      for (int x = 0; x < to_width; ++x) {
+        const int left = x * from_width / to_width, top = y * from_height / to_height;
+        const int right = std::max(left + 1, (x + 1) * from_width / to_width);
+        const int bottom = std::max(top + 1, (y + 1) * from_height / to_height);
+        FakePixel sum{0, 0, 0, 0};
+        for (int v = top; v < bottom; ++v) {
+          for (int u = left; u < right; ++u) {
+            const FakePixel p = LoadFakePixel(*from, s.left + u, s.top + v);
+            sum = {sum.a + p.a, sum.r + p.r * p.a, sum.g + p.g * p.a, sum.b + p.b * p.a};
+          }
+        }
+        const double alpha = sum.a > 0 ? sum.a : 1;
+        StoreFakePixel(*to, d.left + x, d.top + y,
+                       {sum.a / ((right - left) * (bottom - top)), sum.r / alpha, sum.g / alpha,
+                        sum.b / alpha});
+      }
+    }
+    return HX_ERR_NONE;
+  }
+  static HX_Err Utility(HX_EffectRef, std::int32_t operation, const void* table) {
+    Lock lock(current->mutex_);
+    current->Expect((operation == HX_UTILITY_BEGIN_RENDER) == (table != nullptr),
+                    "a render's beginning, alone, has a table");
+    return current->Operate("utility " + std::to_string(operation)) ? FakeHost::kFault
+                                                                    : HX_ERR_NONE;
+  }
+
   static HX_Err NewWorld(HX_EffectRef, std::int32_t width, std::int32_t height, std::uint8_t,
                          std::uint32_t format, HX_World* world) {
     Lock lock(current->mutex_);
     if (current->Operate("World.NewWorld")) return FakeHost::kFault;
-    const int row_bytes = width * BytesOfPixel(format);
+    const int row_bytes = width * FakePixelBytes(format);
     void* data = ::operator new(static_cast<std::size_t>(row_bytes) * height);
     std::memset(data, 0, static_cast<std::size_t>(row_bytes) * height);
     current->worlds_.insert(data);
@@ -203,6 +280,7 @@ struct FakeHostCallbacks {
   static constexpr HX_ParamUtilsSuite3 kParamUtils = {UpdateParamUI, SetParamValue};
   static constexpr HX_PrivateEffectSuite3 kPrivate = {ConvertText, nullptr, nullptr, nullptr,
                                                       ForceRerender};
+  static constexpr HX_AdvAppSuite1 kAdvApp = {RefreshAllWindows, InfoText};
   static constexpr HX_WorldSuite2 kWorlds = {NewWorld, DisposeWorld};
 
   static const HX_Callbacks& Callbacks() {
@@ -222,6 +300,9 @@ struct FakeHostCallbacks {
       cb.handle_size = HandleSize;
       cb.format = Format;
       cb.copy_text = CopyText;
+      cb.copy_world = CopyWorld;
+      cb.transfer = Transfer;
+      cb.utility = Utility;
       return cb;
     }();
     return callbacks;
@@ -233,6 +314,7 @@ FakeHost::FakeHost() : params(1) {
   current = this;
   Offer(HX_PARAM_UTILS_SUITE, HX_PARAM_UTILS_SUITE_VERSION, &FakeHostCallbacks::kParamUtils);
   Offer(HX_PRIVATE_EFFECT_SUITE, HX_PRIVATE_EFFECT_SUITE_VERSION, &FakeHostCallbacks::kPrivate);
+  Offer(HX_ADV_APP_SUITE, HX_ADV_APP_SUITE_VERSION, &FakeHostCallbacks::kAdvApp);
   Offer(HX_WORLD_SUITE, HX_WORLD_SUITE_VERSION, &FakeHostCallbacks::kWorlds);
   in.basic = &FakeHostCallbacks::kBasic;
   in.cb = &FakeHostCallbacks::Callbacks();
@@ -275,6 +357,17 @@ void FakeHost::FailOperation(int n) {
 void FakeHost::Offer(const std::string& name, std::int32_t version, const void* table) {
   std::lock_guard<std::recursive_mutex> lock(mutex_);
   suites_[{name, version}] = table;
+}
+
+std::vector<std::string> FakeHost::info_text() const {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  return info_text_;
+}
+
+int FakeHost::Count(const std::string& name) const {
+  std::lock_guard<std::recursive_mutex> lock(mutex_);
+  return static_cast<int>(std::count_if(operations_.begin(), operations_.end(),
+                                        [&](const Operation& o) { return o.name == name; }));
 }
 
 int FakeHost::rerenders() const {

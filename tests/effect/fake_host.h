@@ -48,14 +48,21 @@ class FakeHost {
   void OfferAllSuites() { refused_.clear(); }
   const std::vector<Operation>& operations() const { return operations_; }
   void ForgetOperations() { operations_.clear(); }
+  // How many operations have this name.
+  int Count(const std::string& name) const;
 
-  // Offers a table beside the fake's own: Param Utils 3, Private Effect 3 and World 2.
+  // Offers a table beside the fake's own: Param Utils 3, Private Effect 3, Adv App 1 and World 2.
   void Offer(const std::string& name, std::int32_t version, const void* table);
+
+  // Held by every operation: for a test that changes what other threads read.
+  std::recursive_mutex& mutex() { return mutex_; }
 
   // Index 0 is the layer; the rest is what add_param appended. Checkouts give copies.
   std::vector<HX_ParamDef> params;
   std::vector<std::int32_t> checkout_times;
 
+  // What the information panel shows, a line after the other.
+  std::vector<std::string> info_text() const;
   int rerenders() const;
   std::string handle_bytes(HX_Handle handle) const;
 
@@ -82,5 +89,6 @@ class FakeHost {
   std::vector<Operation> operations_;
   int fail_in_ = 0;
   std::vector<std::string> mistakes_;
+  std::vector<std::string> info_text_;
   int rerenders_ = 0;
 };

@@ -186,7 +186,7 @@ TEST(StabilizerMain, ComesNearTheCameraWithoutItsShake) {
     ASSERT_EQ(clip.result, 1);
     double in = 0, out = 0;
     for (std::size_t i = 0; i < world.intended.size(); ++i) {
-      const point2 truth = world.intended[i];
+      const synthetic::point2 truth = world.intended[i];
       const track_sample& a = clip.global.input[i];
       const track_sample& b = clip.global.output[i];
       in += std::pow(a.x - truth.x, 2) + std::pow(a.y - truth.y, 2);

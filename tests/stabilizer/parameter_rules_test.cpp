@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "stabilizer/effect/src/analysis_parameter_rows.h"
-#include "stabilizer/effect/src/analysis_parameter_rules.h"
+#include "analysis/effect/analysis_parameter_rows.h"
+#include "analysis/effect/analysis_parameter_rules.h"
 
 namespace kelp::effect {
 namespace {

@@ -8,6 +8,7 @@
 #include <random>
 #include <thread>
 
+#include "platform/tessel/threads.h"
 #include "stabilizer/effect/src/parameter_rules.h"
 #include "synthetic/track_world.h"
 
@@ -43,8 +44,9 @@ SolverParamsRecord Params() {
 }
 
 std::unique_ptr<Solver> NewSolver(const AllFeatures& table, bool needs_cropper = true,
-                                  boost::function<void()> notify = {}) {
-  return std::make_unique<Solver>(kWidth, kHeight, table, 0, Params(), needs_cropper,
+                                  boost::function<void()> notify = {},
+                                  std::uint32_t map_radius = 0) {
+  return std::make_unique<Solver>(kWidth, kHeight, table, map_radius, Params(), needs_cropper,
                                   std::move(notify));
 }
 
@@ -66,11 +68,16 @@ TEST(SolverTest, SuppliedWarperIsKeptAndNothingIsSolved) {
   auto first = NewSolver(ShakenTable(20, 40), false);
   first->Run();
   ASSERT_EQ(first->GetState(), Solver::finished);
-  auto second = NewSolver(ShakenTable(20, 40));
+  auto second = NewSolver(ShakenTable(20, 40), true, {}, 2);
   second->SetExistingWarper(first->GetWarper());
   second->Run();
   EXPECT_EQ(second->GetState(), Solver::finished);
-  EXPECT_EQ(second->GetWarper(), first->GetWarper());
+  // A published warper is never written: the second has its own map over the same warps.
+  EXPECT_NE(second->GetWarper(), first->GetWarper());
+  EXPECT_EQ(second->GetWarper()->frameWarp(7), first->GetWarper()->frameWarp(7));
+  EXPECT_EQ(second->GetWarper()->frameMap()->radius(), 2);
+  EXPECT_EQ(second->GetWarper()->frameMap()->entries().size(), 2u * (19 + 18));
+  EXPECT_EQ(first->GetWarper()->frameMap()->radius(), 0);
   EXPECT_TRUE(second->GetTransitionWindows().empty());
   EXPECT_TRUE(second->GetFactorizationWindows().empty());
   EXPECT_TRUE(second->GetCropper());
@@ -81,8 +88,8 @@ TEST(SolverTest, ResultsOutliveTheSolver) {
   solver->Run();
   const auto warper = solver->GetWarper();
   solver.reset();
-  warper->makeFrameMap(1);  // reads the tracks
-  EXPECT_EQ(warper->frameWarpCount(), 20u);
+  const auto mapped = warper->withFrameMap(1);  // reads the tracks
+  EXPECT_EQ(mapped->frameWarpCount(), 20u);
 }
 
 // Clips with little to go by still get a finite warp for every frame.
@@ -115,6 +122,14 @@ TEST(SolverTest, DegenerateTablesFinish) {
     }
     EXPECT_TRUE(solver->GetCropper());
   }
+}
+
+// Where the task has not begun yet nobody waits for it: it ends by itself, and tells so.
+TEST(SolverTest, NotifiesThoughDroppedAtOnce) {
+  tessel::threads::CompletionEvent notified;
+  NewSolver(ShakenTable(20, 40), true, [&] { notified.Signal(); })->Start();
+  notified.Wait();
+  tessel::threads::Shutdown();
 }
 
 TEST(SolverTest, DroppingBeforeTheTaskBeginsAndWhileItRuns) {

@@ -5,8 +5,8 @@
 #include <map>
 #include <string>
 
+#include "analysis/effect/analysis_strings.h"
 #include "platform/tessel/config.h"
-#include "stabilizer/effect/src/analysis_strings.h"
 
 namespace kelp::effect {
 namespace {

@@ -8,8 +8,8 @@
 #include <stdexcept>
 #include <vector>
 
+#include "analysis/effect/analysis_parameter_rows.h"
 #include "platform/tessel/debug.h"
-#include "stabilizer/effect/src/analysis_parameter_rows.h"
 
 namespace kelp::effect {
 namespace {

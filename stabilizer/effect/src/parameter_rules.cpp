@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <cmath>
 
-#include "stabilizer/effect/src/analysis_parameter_rules.h"
+#include "analysis/effect/analysis_parameter_rules.h"
 
 namespace kelp::effect {
 

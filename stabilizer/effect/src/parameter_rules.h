@@ -32,7 +32,7 @@ struct ClipGeometry {
   std::uint32_t height = 0;
   std::int64_t pixel_aspect_num = 1;  // width : height of a pixel
   std::int64_t pixel_aspect_den = 1;
-  double frame_rate = 25;  // analysed frames a second
+  double frame_rate = 25;  // frames a second, also of an interlaced clip
 
   // The frame's width in square pixels: rounded half away from zero, at least 1.
   std::uint32_t square_width() const;

@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <iterator>
 
-#include "stabilizer/effect/src/analysis_parameter_rows.h"
+#include "analysis/effect/analysis_parameter_rows.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
 
 namespace kelp::effect {

@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "stabilizer/effect/src/parameter_row.h"
+#include "effect/parameter_row.h"
 
 // All parameters of the stabilizer by index, 0 being the host's input layer. A parameter has an
 // index; a disk id, which projects store; and, if every analysing effect has it, the id of

@@ -1,10 +1,13 @@
 #include "stabilizer/effect/src/solver.h"
 
 #include <algorithm>
+#include <atomic>
 #include <boost/make_shared.hpp>
 #include <stdexcept>
+#include <utility>
 
 #include "platform/tessel/debug.h"
+#include "platform/tessel/threads.h"
 #include "stabilization/stabilizer_main.h"
 
 using marrow::stabilization::CPWarper;
@@ -22,45 +25,123 @@ constexpr float kWarperShare = 0.5f;
 constexpr float kCropperShare = 0.05f;
 }  // namespace
 
-Solver::Solver(std::uint32_t frame_width, std::uint32_t frame_height,
-               const marrow::tracking::AllFeatures& all_features, std::uint32_t frame_map_radius,
-               const SolverParamsRecord& solver_parameters, bool needs_cropper,
-               boost::function<void()> notify_owner)
-    : width(frame_width),
-      height(frame_height),
-      features(all_features),
-      frameMapRadius(frame_map_radius),
-      parameters(solver_parameters),
-      needsCropper(needs_cropper),
-      notify(std::move(notify_owner)),
-      completion(boost::make_shared<tessel::threads::CompletionEvent>()) {}
+// All that the task touches.
+class Solver::Core {
+ public:
+  Core(Inputs solve_inputs, boost::function<void()> notify_owner)
+      : inputs(std::move(solve_inputs)), notify(std::move(notify_owner)) {}
 
-// A posted task touches this object until it signals, so it is waited for whether or not it has
-// begun: one that begins late sees the flag at its first poll.
+  void Run();
+
+  const Inputs inputs;
+  bool warperSupplied = false;
+  std::vector<marrow::stabilization::factorization_window> factorizationWindows;
+  std::vector<marrow::stabilization::transition_record> transitionWindows;
+  boost::shared_ptr<stabilizer_global> globalData;
+  boost::shared_ptr<const CPWarper> warper;
+  boost::shared_ptr<const cropper> cropperResult;
+  const boost::function<void()> notify;
+  std::atomic<std::uint32_t> state{not_started};
+  std::atomic<std::int64_t> cancelFlag{0};
+  std::atomic<std::uint64_t> cancelPolls{0};
+  std::atomic<float> progressShare{0};
+  tessel::threads::CompletionEvent completion;
+
+ private:
+  void Execute();
+  void RunFactorization();
+  void MakeWarperUsingFactorization(CPWarper& newWarper);
+  boost::shared_ptr<cropper> MakeCropper();
+  progress_functor MakeProgressFunctor();
+  void Poll();
+  void ReportShare(float begin, float length, std::uint64_t framesDone);
+};
+
+Solver::Solver(std::uint32_t width, std::uint32_t height,
+               const marrow::tracking::AllFeatures& features, std::uint32_t frameMapRadius,
+               const SolverParamsRecord& parameters, bool needsCropper,
+               boost::function<void()> notify)
+    : core_(boost::make_shared<Core>(
+          Inputs{width, height, features, frameMapRadius, parameters, needsCropper},
+          std::move(notify))) {}
+
+// A task that has begun is waited for, since its notification may be of something that goes with
+// the owner. One that begins later finds the flag at its first poll.
 Solver::~Solver() {
-  cancelFlag.exchange(1);
-  if (started) completion->Wait();
+  core_->cancelFlag.exchange(1);
+  if (started_ && GetState() != not_started) core_->completion.Wait();
 }
 
-void Solver::SetExistingWarper(boost::shared_ptr<CPWarper> existing) {
+void Solver::SetExistingWarper(boost::shared_ptr<const CPWarper> existing) {
   if (!existing) return;
-  warperSupplied = true;
-  warper = std::move(existing);
+  core_->warperSupplied = true;
+  core_->warper = std::move(existing);
 }
 
 void Solver::Start() {
-  started = true;
-  tessel::threads::GetCPUBoundExecutor().Post([this] { Run(); });
+  started_ = true;
+  tessel::threads::GetCPUBoundExecutor().Post([core = core_] { core->Run(); });
 }
 
 void Solver::Run() {
-  // The event outlives the object, whose owner may drop it as soon as the event is signalled.
-  const boost::shared_ptr<tessel::threads::CompletionEvent> done = completion;
+  core_->Run();
+}
+
+void Solver::Cancel() {
+  core_->cancelFlag.store(1);
+}
+
+void Solver::Wait() {
+  core_->completion.Wait();
+}
+
+bool Solver::WaitFor(std::chrono::milliseconds time) {
+  return core_->completion.WaitFor(time);
+}
+
+Solver::State Solver::GetState() const {
+  return static_cast<State>(core_->state.load(std::memory_order_acquire));
+}
+
+float Solver::GetProgress() const {
+  return core_->progressShare.load(std::memory_order_relaxed);
+}
+
+std::uint64_t Solver::GetPollCount() const {
+  return core_->cancelPolls.load(std::memory_order_relaxed);
+}
+
+const Solver::Inputs& Solver::inputs() const {
+  return core_->inputs;
+}
+
+bool Solver::warper_supplied() const {
+  return core_->warperSupplied;
+}
+
+const boost::shared_ptr<const CPWarper>& Solver::GetWarper() const {
+  return core_->warper;
+}
+
+const boost::shared_ptr<const cropper>& Solver::GetCropper() const {
+  return core_->cropperResult;
+}
+
+const std::vector<marrow::stabilization::factorization_window>& Solver::GetFactorizationWindows()
+    const {
+  return core_->factorizationWindows;
+}
+
+const std::vector<marrow::stabilization::transition_record>& Solver::GetTransitionWindows() const {
+  return core_->transitionWindows;
+}
+
+void Solver::Core::Run() {
   state.store(running);
   State end = finished;
   try {
     Execute();
-    if (needsCropper) cropperResult = MakeCropper();
+    if (inputs.needsCropper) cropperResult = MakeCropper();
   } catch (const CancelException&) {
     end = cancelled;
   } catch (...) {
@@ -68,31 +149,33 @@ void Solver::Run() {
   }
   state.store(end, std::memory_order_release);
   if (notify) notify();
-  done->Signal();
+  completion.Signal();
 }
 
-void Solver::Execute() {
+void Solver::Core::Execute() {
+  Poll();
   if (warper) {
-    warper->makeFrameMap(frameMapRadius, MakeProgressFunctor());
+    warper = warper->withFrameMap(inputs.frameMapRadius, MakeProgressFunctor());
     return;
   }
   auto global = boost::make_shared<stabilizer_global>();
-  FillStabilizerGlobal(*global, static_cast<std::uint64_t>(features.feature_count),
-                       static_cast<std::uint64_t>(features.frame_count), features,
-                       parameters.pixel_aspect);
+  FillStabilizerGlobal(*global, static_cast<std::uint64_t>(inputs.features.feature_count),
+                       static_cast<std::uint64_t>(inputs.features.frame_count), inputs.features,
+                       inputs.parameters.pixel_aspect);
   Poll();
   factorizationWindows.clear();
   transitionWindows.clear();
   globalData = std::move(global);
   RunFactorization();
   Poll();
-  auto newWarper = boost::make_shared<CPWarper>(
-      features.frame_count, static_cast<std::int32_t>(width), static_cast<std::int32_t>(height));
+  auto newWarper = boost::make_shared<CPWarper>(inputs.features.frame_count,
+                                                static_cast<std::int32_t>(inputs.width),
+                                                static_cast<std::int32_t>(inputs.height));
   MakeWarperUsingFactorization(*newWarper);
   warper = std::move(newWarper);
 }
 
-void Solver::RunFactorization() {
+void Solver::Core::RunFactorization() {
   const tessel::debug::TimingEntry timing(kChannel, kTimingLevel, "RunFactorization()");
   const progress_functor poll = MakeProgressFunctor();
   const auto progress = [this, &poll] {
@@ -102,49 +185,50 @@ void Solver::RunFactorization() {
     if (!transitionWindows.empty()) done = std::max(done, transitionWindows.back().end);
     ReportShare(0.0f, kFactorizationShare, done);
   };
-  if (!stabilizer_main(*globalData, parameters, transitionWindows, factorizationWindows,
-                       static_cast<int>(width), static_cast<int>(height), progress)) {
+  if (!stabilizer_main(*globalData, inputs.parameters, transitionWindows, factorizationWindows,
+                       static_cast<int>(inputs.width), static_cast<int>(inputs.height), progress)) {
     throw std::runtime_error("failure returned from stabilizer_main");
   }
 }
 
-void Solver::MakeWarperUsingFactorization(CPWarper& newWarper) {
+void Solver::Core::MakeWarperUsingFactorization(CPWarper& newWarper) {
   const tessel::debug::TimingEntry timing(kChannel, kTimingLevel, "MakeWarperUsingFactorization()");
   const progress_functor poll = MakeProgressFunctor();
-  newWarper.buildDisplacements(globalData, factorizationWindows, transitionWindows, parameters,
-                               poll);
+  newWarper.buildDisplacements(globalData, factorizationWindows, transitionWindows,
+                               inputs.parameters, poll);
   newWarper.drive([this, &poll, &newWarper] {
     poll();
     ReportShare(kFactorizationShare, kWarperShare, newWarper.frameWarpCount());
   });
-  newWarper.makeFrameMap(frameMapRadius, poll);
+  newWarper.makeFrameMap(inputs.frameMapRadius, poll);
 }
 
-boost::shared_ptr<cropper> Solver::MakeCropper() {
+boost::shared_ptr<cropper> Solver::Core::MakeCropper() {
   const tessel::debug::TimingEntry timing(kChannel, kTimingLevel, "RunCropper()");
   const progress_functor poll = MakeProgressFunctor();
   std::uint64_t frames = 0;
-  return RunCropper(parameters, static_cast<std::size_t>(features.frame_count), *warper,
-                    [this, &poll, &frames] {
+  return RunCropper(inputs.parameters, static_cast<std::size_t>(inputs.features.frame_count),
+                    *warper, [this, &poll, &frames] {
                       poll();
                       ReportShare(kFactorizationShare + kWarperShare, kCropperShare, ++frames);
                     });
 }
 
-progress_functor Solver::MakeProgressFunctor() {
+progress_functor Solver::Core::MakeProgressFunctor() {
   return [this] { Poll(); };
 }
 
-void Solver::Poll() {
+void Solver::Core::Poll() {
   cancelPolls.fetch_add(1, std::memory_order_relaxed);
   std::int64_t expected = 0;
   if (!cancelFlag.compare_exchange_strong(expected, 0)) throw CancelException();
 }
 
-void Solver::ReportShare(float begin, float length, std::uint64_t framesDone) {
+void Solver::Core::ReportShare(float begin, float length, std::uint64_t framesDone) {
   const float share =
-      begin + length * std::min(1.0f, static_cast<float>(framesDone) /
-                                          static_cast<float>(std::max(features.frame_count, 1)));
+      begin +
+      length * std::min(1.0f, static_cast<float>(framesDone) /
+                                  static_cast<float>(std::max(inputs.features.frame_count, 1)));
   // A rank that fails starts over; what a person sees does not go back.
   if (share > progressShare.load(std::memory_order_relaxed)) {
     progressShare.store(share, std::memory_order_relaxed);

@@ -52,13 +52,22 @@ const HX_StringTable& StabilizerStringTable();
 // wording counts.
 const char* StabilizerStatusLiteral(std::int32_t status);
 
+// As messages name the effect.
+inline constexpr char kEffectName[] = "Calmframe";
+
 // @0: the present scale in percent.
 inline constexpr char kAutoScaleReadout[] =
     "$$$/Plugin/Stabilizer/AutoScaleReadout=Auto-scale (@0%)";
-// @0: the frame.
-inline constexpr char kOutOfMemoryError[] =
-    "$$$/OV/Stabilizer/OutOfMemoryError=Calmframe out of memory on frame @0.";
-inline constexpr char kGenericError[] =
-    "$$$/OV/Stabilizer/GenericError=unknown exception on frame @0 in Calmframe.";
+
+// What a project's data is refused with.
+inline constexpr char kVersionTooOld[] =
+    "$$$/Plugin/Stabilizer/Error/VersionTooOld=Calmframe requires re-analysis because the project "
+    "data is from an old version.";
+inline constexpr char kVersionTooNew[] =
+    "$$$/Plugin/Stabilizer/Error/VersionTooNew=Calmframe requires re-analysis because the project "
+    "data is from a newer version.";
+inline constexpr char kBadSerializedData[] =
+    "$$$/Plugin/Stabilizer/Error/BadSerializedData=Calmframe requires re-analysis because saved "
+    "data has been damaged.";
 
 }  // namespace kelp::effect

@@ -3,7 +3,7 @@
 #include <array>
 #include <cstdint>
 
-#include "stabilizer/effect/src/parameter_reader.h"
+#include "effect/parameter_reader.h"
 #include "stabilizer/effect/src/parameter_table.h"
 
 namespace kelp::effect {
@@ -29,24 +29,20 @@ class ParameterValues final : public ParameterSource {
   std::array<double, kParamCount> values_{};
 };
 
-// Reads the source, but for experimental parameters that are not shown: those have their defaults,
-// and the source is not asked.
-class TableReader final : public ParameterReader {
+// The parameters of the table, with or without the experimental ones.
+class TableReader final : public VisibleParameterReader {
  public:
   // Keeps a reference to the source.
   TableReader(const ParameterSource& source, bool shows_experimental)
       : source_(source), shows_experimental_(shows_experimental) {}
 
-  double GetFloatParam(std::int32_t id) const override;
-  // The source's value + 0.5, truncated; a default is truncated as it is.
-  std::int32_t GetIntParam(std::int32_t id) const override;
-  bool GetBoolParam(std::int32_t id) const override;
-  std::int32_t GetPopupParam(std::int32_t id) const override;
-
  private:
-  bool IsParamAbsent(std::int32_t index) const {
+  std::int32_t IndexOf(std::int32_t id) const override;
+  bool IsAbsent(std::int32_t index) const override {
     return !shows_experimental_ && IsExperimentalIndex(index);
   }
+  double Default(std::int32_t index) const override { return GetParamDefault(index); }
+  double Value(std::int32_t index) const override { return source_.Value(index); }
 
   const ParameterSource& source_;
   const bool shows_experimental_;

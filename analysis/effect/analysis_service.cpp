@@ -1,0 +1,267 @@
+#include <string>
+
+#include "analysis/effect/analysis_effect.h"
+#include "analysis/effect/analysis_parameter_rows.h"
+#include "analysis/effect/analysis_strings.h"
+#include "analysis/effect/effect_parameters.h"
+#include "analysis/host/video_segment_render_suite_job.h"
+#include "analysis/src/identities.h"
+#include "analysis/src/mix_hash_guid.h"
+#include "analysis/src/progress.h"
+#include "analysis/src/read_job_input.h"
+#include "analysis/src/track_file.h"
+#include "effect/host_requests.h"
+#include "effect/host_text.h"
+#include "effect/suite.h"
+#include "platform/tessel/config.h"
+#include "platform/tessel/utility.h"
+#include "platform/tesselui/save_dialog.h"
+
+// What AnalysisEffect does about its analysis: the buttons, the start, the idle step, the end.
+namespace kelp::analysis::effect {
+
+using kelp::effect::ScopedSuite;
+using kelp::effect::ThrowIfFailed;
+using tessel::utility::HighPrecisionTime;
+
+namespace {
+
+void EndJob(const kelp::effect::HostContext& context, Analyzer& analyzer,
+            const std::string& text = {}) {
+  analyzer.Cancel(context.in, context.out, text.c_str());
+  analyzer.Stop(context.in, context.out);
+}
+
+}  // namespace
+
+void AnalysisEffect::UpdateButton(std::int32_t id, bool enabled, const char* name) {
+  const std::int32_t index = ParamIdToIndex(id);
+  if (index != kNoIndex) kelp::effect::UpdateParamUI(context(), index, {enabled, name});
+}
+
+void AnalysisEffect::UpdateStartStopButtonEnablement(bool analyze_enabled, bool cancel_enabled,
+                                                     const char* cancel_label) {
+  const std::string label = cancel_label == nullptr ? "" : cancel_label;
+  constexpr char kName[] = "AnalysisEffect::UpdateStartStopButtonEnablement";
+  MixHashGuid mix(kName);
+  mix.Add(kName, sizeof kName - 1);
+  mix.Add(label.data(), label.size());
+  mix.AddValue(static_cast<std::uint8_t>(cancel_enabled));
+  mix.AddValue(static_cast<std::uint8_t>(analyze_enabled));
+  AnalysisState* const state = GetState();
+  if (state != nullptr && state->button_identity == mix.Finish()) return;
+  UpdateButton(kCancelParam, cancel_enabled, label.c_str());
+  UpdateButton(kAnalyzeParam, analyze_enabled, nullptr);
+  if (state != nullptr) state->button_identity = mix.Finish();
+}
+
+bool AnalysisEffect::IsAnalysisCurrent(AnalysisState* state) {
+  if (state == nullptr) return false;
+  const PresentInputs present{
+      [this] { return ReadJobInput(context().in, context().out); },
+      [this] { return GetIdentifierForTracker(GetSelectorParams(), GetTrackerParams()); },
+      [this] { return GetUpstreamIdentifier(context().in, context().out); }};
+  return analysis::IsAnalysisCurrent(*state, present, context().out);
+}
+
+bool AnalysisEffect::IsBusy() {
+  const AnalysisState* const state = GetState();
+  return state != nullptr && state->analyzer;
+}
+
+void AnalysisEffect::DropSolveJob() {}
+
+void AnalysisEffect::HandleParamChange(const HX_ParamChangedExtra& extra) {
+  const std::int32_t id = IndexToParamId(extra.param_index);
+  // What can't be identified fails before anything changes.
+  if (id == kAnalyzeParam) ReadJobInput(context().in, context().out);
+  if (IsOneByOne()) return;
+  switch (id) {
+    case kCancelParam:
+      CancelAnalysis(GetState(), context().params, true);
+      RefreshParams();
+      return;
+    case kSaveTrackFileParam:
+      SaveTrackFile();
+      return;
+    case kAnalyzeParam:
+    case kDetailedAnalysisParam:
+      StartAnalysisFromUI();
+      return;
+    default:
+      RefreshParams();
+      return;
+  }
+}
+
+void AnalysisEffect::StartAnalysisFromUI() {
+  bool started = false;
+  try {
+    UpdateStartStopButtonEnablement(false, true, nullptr);
+    const ScopedSuite<HX_AnalysisHostSuite1> suite(context());
+    ThrowIfFailed(suite->ScheduleAnalysis(context().in->effect_ref));
+    ReadJobInput(context().in, context().out);
+    started = true;
+    RestartAnalysis();
+  } catch (...) {
+    try {
+      UpdateStartStopButtonEnablement(true, false, nullptr);
+    } catch (...) {  // the first failure is the one that counts
+    }
+    if (started) MarkAnalysisFailed();
+    if ((context().out->out_flags & HX_OUT_FLAG_SHOW_MESSAGE) == 0) throw;
+  }
+}
+
+void AnalysisEffect::StartAnalysis() {
+  AnalysisState* const state = GetState();
+  if (state == nullptr) return;
+  DropSolveJob();
+  const marrow::tracking::SelectorParams selector = GetSelectorParams();
+  const marrow::tracking::TrackerParams tracker = GetTrackerParams();
+  const bool detailed = GetBoolParam(kDetailedAnalysisParam);
+  state->Begin(context().in, context().out, selector, tracker, detailed,
+               MakeVideoSegmentRenderSuiteJob);
+  kelp::effect::ShowInfoText(context(), nullptr, nullptr);
+  PublishSharedData();
+  kelp::effect::ForceRerender(context());
+}
+
+void AnalysisEffect::CancelAnalysis(AnalysisState* state, HX_ParamDef** params, bool show_text) {
+  if (state == nullptr || !state->analyzer) return;
+  const std::string text = GetCancelMessage();
+  EndJob(context(), *state->analyzer, text);
+  state->analyzer.reset();
+  if (show_text) kelp::effect::ShowInfoText(context(), text.c_str(), nullptr);
+  if (params != nullptr) PublishStatus(FrameStatus::PressAnalyze);
+}
+
+bool AnalysisEffect::ServiceAnalysis(bool from_render) {
+  if (context().in->instance_handle == nullptr) return false;
+  AnalysisState* const state = GetState();
+  if (state == nullptr) return false;
+  const bool detailed = GetBoolParam(kDetailedAnalysisParam);
+  // Whether the analysis is current is asked of the host only where that decides something.
+  if (bool(state->detailed != detailed) && IsAnalysisCurrent(state)) {
+    state->analysis_pending = false;
+    if (!from_render) {
+      state->detailed = detailed;  // a start that is refused is not tried again with each tick
+      HandleParamChange({ParamIdToIndex(kAnalyzeParam)});
+    }
+    return true;
+  }
+  if (!state->analyzer) return false;
+  PollAnalysis(*state);
+  return true;
+}
+
+void AnalysisEffect::PollAnalysis(AnalysisState& state) {
+  const boost::shared_ptr<Analyzer> analyzer = state.analyzer;
+  if (analyzer->job_stage() == JobStage::NotStarted) {
+    BeginPolledAnalysis(state);
+    return;
+  }
+  const JobState job = analyzer->GetStatus().state;
+  const bool failed_with_text =
+      analyzer->ReportFailure(context().in, context().out) && !analyzer->GetErrorText().empty();
+  if (job == JobState::Running && analyzer->job_stage() != JobStage::SeenRunning) {
+    analyzer->set_job_stage(JobStage::SeenRunning);
+    state.progress.start_tick = HighPrecisionTime::Now();
+  }
+  if (job <= JobState::Running) {
+    RefreshParams();
+  } else if (analyzer->job_stage() == JobStage::SeenRunning) {
+    RefreshParams();
+    analyzer->set_job_stage(JobStage::SeenEnded);
+    kelp::effect::ForceRerender(context());
+  } else {
+    EndPolledAnalysis(state, job == JobState::Finished, failed_with_text);
+  }
+}
+
+void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
+  const ScopedSuite<HX_AnalysisHostSuite1> suite(context());
+  std::uint8_t may = 0;
+  ThrowIfFailed(suite->MayStart(context().in->effect_ref, &may));
+  const boost::logic::tribool detailed = state.detailed;
+  boost::shared_ptr<Analyzer> analyzer;
+  analyzer.swap(state.analyzer);
+  // One that can't start is gone, so that it is not tried again with each tick.
+  analyzer->Start(context().in, context().out);
+  AnalysisState* present = nullptr;
+  try {
+    present = GetState();
+  } catch (...) {  // nobody would end the job
+    EndJob(context(), *analyzer);
+    throw;
+  }
+  if (present == nullptr) {
+    EndJob(context(), *analyzer);
+    return;
+  }
+  present->first_analysis = true;
+  present->progress = ProgressClock{HighPrecisionTime::Now(), 0, 0};
+  present->tracker_identity = analyzer->GetTrackerGuid();
+  present->source_identity = analyzer->GetSourceIdentity();
+  present->analyzer = analyzer;
+  present->detailed = detailed;
+  PublishStatus(FrameStatus::AnalysisInProgress);
+  kelp::effect::ForceRerender(context());
+}
+
+void AnalysisEffect::EndPolledAnalysis(AnalysisState& state, bool finished, bool failed_with_text) {
+  if (finished && state.TakeResults()) {
+    MarkNeedsSolve();
+    PublishStatus(state.first_analysis ? FrameStatus::SolveInProgress
+                                       : FrameStatus::SubsequentSolve);
+    kelp::effect::ForceRerender(context());
+    kelp::effect::RefreshAllWindows(context());
+  } else {
+    if (failed_with_text) MarkAnalysisFailed();
+    PublishStatus(FrameStatus::PressAnalyze);
+    kelp::effect::ForceRerender(context());
+  }
+  state.analyzer->Stop(context().in, context().out);
+  state.analyzer.reset();
+  PublishSharedData();
+  kelp::effect::ForceRerender(context());
+  RefreshParams();
+}
+
+void AnalysisEffect::RefreshParams() {
+  if (context().params == nullptr) return;
+  AnalysisState* const state = GetState();
+  if (state == nullptr || !state->analyzer) {
+    UpdateStartStopButtonEnablement(!IsAnalysisCurrent(state), false, nullptr);
+    return;
+  }
+  const JobStage stage = state->analyzer->job_stage();
+  if (stage != JobStage::NotStarted) {
+    const JobState job = state->analyzer->GetStatus().state;
+    if (job == JobState::Running || (job > JobState::Running && stage == JobStage::SeenRunning)) {
+      const std::string text = GetProgressText(*state, context().in, context().out);
+      UpdateStartStopButtonEnablement(false, true, text.c_str());
+    }
+    if (job != JobState::Ready) return;
+  }
+  char text[kelp::effect::kHostTextSize];
+  kelp::effect::ConvertToHostText(
+      context(), tessel::config::Localizer::LocalizeUTF16(kCancelButtonInitializing), text);
+  UpdateStartStopButtonEnablement(false, true, text);
+  state->progress.start_tick = HighPrecisionTime::Now();
+}
+
+void AnalysisEffect::SaveTrackFile() {
+  const AnalysisState* const state = GetState();
+  if (state != nullptr && state->all_features.frame_count > 0) {
+    const auto path = tesselui::SaveAs({"TRK Files (*.trk)", "trk", "trk", 4});
+    const marrow::tracking::AllFeatures& table = state->all_features;
+    if (path) {
+      WriteTrackFile(*path, table.features->data(), table.features->size(), 0, table.frame_count,
+                     static_cast<std::uint32_t>(table.feature_count));
+    }
+  }
+  UpdateButton(kSaveTrackFileParam, true, "");
+}
+
+}  // namespace kelp::analysis::effect

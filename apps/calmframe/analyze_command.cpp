@@ -1,0 +1,54 @@
+#include "apps/calmframe/analyze_command.h"
+
+#include <cstdio>
+#include <memory>
+#include <nlohmann/json.hpp>
+
+#include "apps/calmframe/steady_clip.h"
+#include "platform/tessel/threads.h"
+
+namespace calmframe {
+namespace {
+
+constexpr std::int32_t kAutoScaleGroup = 17;  // disk id; its name tells the scale
+
+}  // namespace
+
+AnalyzeCommand::AnalyzeCommand(CLI::App& program)
+    : command_(program.add_subcommand("analyze",
+                                      "Tell what would become of a clip, without rendering it")) {
+  command_->add_option("IN", input_, "The shaky clip")->required();
+  AddControlFlags(*command_, controls_);
+  AddRunFlags(*command_, run_);
+}
+
+void AnalyzeCommand::Run() {
+  const tessel::threads::ProcessorLimit limit(run_.threads);
+  ProgressLine progress(run_.progress_form());
+  SteadyClip clip(input_, controls_);
+  const media::ClipInfo& info = clip.info();
+  if (!info.warning.empty()) progress.Warn(info.warning);
+  clip.Work(progress);
+  const std::unique_ptr<CropWindow> crop = clip.Crop();
+  if (run_.json) {
+    nlohmann::ordered_json json;
+    json["clip"] = input_;
+    json["width"] = info.width;
+    json["height"] = info.height;
+    json["frames"] = info.frame_count;
+    if (crop) {
+      json["crop_width"] = crop->width;
+      json["crop_height"] = crop->height;
+    }
+    std::printf("%s\n", json.dump().c_str());
+    return;
+  }
+  std::printf("%s: %zu frames of %dx%d\n", input_.c_str(), info.frame_count, info.width,
+              info.height);
+  if (crop) {
+    std::printf("crop window %dx%d, %s\n", crop->width, crop->height,
+                clip.NameOf(kAutoScaleGroup).c_str());
+  }
+}
+
+}  // namespace calmframe

@@ -1,0 +1,26 @@
+#pragma once
+
+#include <CLI/CLI.hpp>
+#include <string>
+
+#include "apps/calmframe/controls.h"
+#include "apps/calmframe/stabilize_command.h"
+
+namespace calmframe {
+
+// `calmframe analyze IN`: what the effect makes of a clip, without rendering it.
+class AnalyzeCommand {
+ public:
+  explicit AnalyzeCommand(CLI::App& program);
+  bool chosen() const { return command_->parsed(); }
+  bool json() const { return run_.json; }
+  void Run();
+
+ private:
+  CLI::App* const command_;
+  std::string input_;
+  ControlFlags controls_;
+  RunFlags run_;
+};
+
+}  // namespace calmframe

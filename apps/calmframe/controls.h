@@ -1,0 +1,32 @@
+#pragma once
+
+#include <CLI/CLI.hpp>
+#include <cstdint>
+#include <map>
+#include <string>
+#include <vector>
+
+#include "platform/hx/hx_params.h"
+
+namespace calmframe {
+
+// How a command line sets the effect's controls.
+struct ControlFlags {
+  std::map<std::int32_t, double> values;  // of the controls with a flag, by disk id; those given
+  std::vector<std::string> params;        // "NAME=VALUE" of any parameter
+  bool experimental = false;              // the effect declares its experimental parameters too
+};
+
+// Adds a flag for each of the user's controls, by the control's name, --param and --experimental.
+void AddControlFlags(CLI::App& command, ControlFlags& flags);
+
+// To be called before the effect is loaded: whether it declares its experimental parameters is
+// settled then.
+void ShowExperimentalParameters(const ControlFlags& flags);
+
+// Values by disk id, all of them valid, later ones of one parameter counting. `declared`: the
+// effect's parameters. Throws UsageFailure, with the nearest name for an unknown one.
+std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,
+                                               const std::vector<HX_ParamDef>& declared);
+
+}  // namespace calmframe

@@ -1,0 +1,38 @@
+#include "apps/calmframe/param_text.h"
+
+#include <cstdio>
+#include <sstream>
+
+namespace calmframe {
+
+bool IsControl(const HX_ParamDef& param) {
+  return !KindText(param).empty() && (param.ui_flags & HX_PARAM_UI_HIDDEN) == 0;
+}
+
+std::string KindText(const HX_ParamDef& param) {
+  switch (param.kind) {
+    case HX_PARAM_FLOAT_SLIDER:
+      return "slider";
+    case HX_PARAM_POPUP:
+      return "popup";
+    case HX_PARAM_CHECKBOX:
+      return "checkbox";
+    default:
+      return "";
+  }
+}
+
+std::vector<std::string> PopupItems(const HX_ParamDef& param) {
+  std::vector<std::string> items;
+  std::istringstream text(param.u.pd.items ? param.u.pd.items : "");
+  for (std::string item; std::getline(text, item, '|');) items.push_back(item);
+  return items;
+}
+
+std::string NumberText(double number) {
+  char text[32];
+  std::snprintf(text, sizeof text, "%g", number);
+  return text;
+}
+
+}  // namespace calmframe

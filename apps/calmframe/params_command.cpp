@@ -1,0 +1,100 @@
+#include "apps/calmframe/params_command.h"
+
+#include <cstdio>
+#include <map>
+#include <nlohmann/json.hpp>
+#include <string>
+#include <vector>
+
+#include "apps/calmframe/failures.h"
+#include "apps/calmframe/param_text.h"
+#include "apps/calmframe/plugin_path.h"
+#include "host/effects/host.h"
+
+namespace calmframe {
+namespace {
+
+double DefaultOf(const HX_ParamDef& param) {
+  switch (param.kind) {
+    case HX_PARAM_FLOAT_SLIDER:
+      return double{param.u.fs.default_value};
+    case HX_PARAM_POPUP:
+      return param.u.pd.default_value;
+    default:
+      return param.u.bd.default_value;
+  }
+}
+
+// A value as --param takes it.
+std::string ValueText(const HX_ParamDef& param, double value) {
+  if (param.kind == HX_PARAM_CHECKBOX) return value != 0 ? "on" : "off";
+  if (param.kind == HX_PARAM_POPUP) {
+    const std::vector<std::string> items = PopupItems(param);
+    const auto index = static_cast<std::size_t>(value) - 1;
+    if (index < items.size()) return items[index];
+  }
+  return NumberText(value);
+}
+
+std::string RangeText(const HX_ParamDef& param) {
+  if (param.kind == HX_PARAM_CHECKBOX) return "on, off";
+  if (param.kind == HX_PARAM_FLOAT_SLIDER) {
+    return NumberText(double{param.u.fs.valid_min}) + " to " +
+           NumberText(double{param.u.fs.valid_max});
+  }
+  std::string text;
+  for (const std::string& item : PopupItems(param)) text += (text.empty() ? "" : " | ") + item;
+  return text;
+}
+
+nlohmann::ordered_json JsonOf(const HX_ParamDef& param, double value) {
+  nlohmann::ordered_json json;
+  json["id"] = param.disk_id;
+  json["name"] = param.name;
+  json["kind"] = KindText(param);
+  if (param.kind == HX_PARAM_FLOAT_SLIDER) {
+    json["min"] = param.u.fs.valid_min;
+    json["max"] = param.u.fs.valid_max;
+  } else if (param.kind == HX_PARAM_POPUP) {
+    json["items"] = PopupItems(param);
+  }
+  json["default"] = DefaultOf(param);
+  json["value"] = value;
+  return json;
+}
+
+}  // namespace
+
+ParamsCommand::ParamsCommand(CLI::App& program)
+    : command_(program.add_subcommand("params", "List the effect's parameters")) {
+  AddControlFlags(*command_, controls_);
+  command_->add_flag("--json", json_, "As a JSON array");
+}
+
+void ParamsCommand::Run() {
+  ShowExperimentalParameters(controls_);
+  std::vector<HX_ParamDef> params;
+  nlohmann::ordered_json list = nlohmann::ordered_json::array();
+  try {
+    const host::Host host(PluginPath());
+    const std::map<std::int32_t, double> given = ResolveControls(controls_, host.declarations());
+    for (const HX_ParamDef& param : host.declarations()) {
+      if (!IsControl(param)) continue;
+      const auto found = given.find(param.disk_id);
+      const double value = found == given.end() ? DefaultOf(param) : found->second;
+      if (json_) {
+        list.push_back(JsonOf(param, value));
+        continue;
+      }
+      std::printf("%-32s %-9s %s (default %s)", param.name, KindText(param).c_str(),
+                  RangeText(param).c_str(), ValueText(param, DefaultOf(param)).c_str());
+      if (value != DefaultOf(param)) std::printf(", now %s", ValueText(param, value).c_str());
+      std::printf("\n");
+    }
+  } catch (const host::PluginError& error) {
+    throw SolveFailure(error.what());
+  }
+  if (json_) std::printf("%s\n", list.dump(2).c_str());
+}
+
+}  // namespace calmframe

@@ -1,0 +1,156 @@
+#include "apps/calmframe/render_clip.h"
+
+#include <algorithm>
+#include <condition_variable>
+#include <cstring>
+#include <exception>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <thread>
+#include <utility>
+#include <vector>
+
+#include "apps/calmframe/failures.h"
+#include "host/effects/renderer.h"
+
+namespace calmframe {
+namespace {
+
+using FramePixels = std::shared_ptr<host::WorldBuffer>;
+
+// The lines of one parity (0: lines 0, 2, 4 ...).
+void CopyField(const host::WorldBuffer& from, int parity, host::WorldBuffer& to) {
+  const auto bytes =
+      static_cast<std::size_t>(host::BytesPerPixel(from.world().format) * from.world().width);
+  for (int y = parity; y < to.world().height; y += 2) {
+    std::memcpy(to.row<std::uint8_t>(y), from.row<std::uint8_t>(y), bytes);
+  }
+}
+
+// A frame as it is to be written. The fields of an interlaced one were shot one after the other, so
+// each is rendered for its own instant and gives its lines.
+FramePixels RenderFrame(host::Renderer& renderer, std::int64_t frame, int depth,
+                        media::FieldOrder order) {
+  const auto render = [&](bool second_field) {
+    host::RenderRequest request;
+    request.frame = frame;
+    request.second_field = second_field;
+    request.bit_depth = depth;
+    const host::RenderedFrame rendered = renderer.Planned(request);
+    if (!rendered.result.ok()) {
+      throw SolveFailure(rendered.result.Line("frame " + std::to_string(frame)));
+    }
+    return rendered.OnLayer();
+  };
+  FramePixels first = render(false);
+  if (order == media::FieldOrder::progressive) return first;
+  const FramePixels second = render(true);
+  CopyField(*second, order == media::FieldOrder::top_first ? 1 : 0, *first);
+  return first;
+}
+
+// Frames 0 .. count - 1, rendered ahead on threads of its own, each of which has a render side of
+// the effect.
+class RenderAhead {
+ public:
+  RenderAhead(SteadyClip& clip, int depth, int threads)
+      : clip_(clip),
+        depth_(depth),
+        count_(static_cast<std::int64_t>(clip.info().frame_count)),
+        window_(2 * threads) {
+    for (int i = 0; i < threads; ++i) threads_.emplace_back([this] { RenderFrames(); });
+  }
+  ~RenderAhead() {
+    {
+      const std::lock_guard lock(mutex_);
+      stopped_ = true;
+    }
+    changed_.notify_all();
+    for (std::thread& thread : threads_) thread.join();
+  }
+  RenderAhead(const RenderAhead&) = delete;
+  RenderAhead& operator=(const RenderAhead&) = delete;
+
+  // In ascending order. Throws what its render threw.
+  FramePixels Take(std::int64_t frame) {
+    std::unique_lock lock(mutex_);
+    taken_ = frame;
+    changed_.notify_all();
+    changed_.wait(lock, [&] { return failure_ || done_.count(frame) > 0; });
+    if (failure_) std::rethrow_exception(failure_);
+    FramePixels pixels = std::move(done_.at(frame));
+    done_.erase(frame);
+    return pixels;
+  }
+
+ private:
+  void RenderFrames() {
+    try {
+      const std::unique_ptr<host::Renderer> renderer = clip_.effect().MakeRenderer();
+      std::unique_lock lock(mutex_);
+      while (true) {
+        changed_.wait(lock, [&] { return stopped_ || failure_ || next_ < taken_ + window_; });
+        if (stopped_ || failure_ || next_ >= count_) return;
+        const std::int64_t frame = next_++;
+        lock.unlock();
+        FramePixels pixels = RenderFrame(*renderer, frame, depth_, clip_.info().field_order);
+        lock.lock();
+        done_[frame] = std::move(pixels);
+        changed_.notify_all();
+      }
+    } catch (...) {
+      const std::lock_guard lock(mutex_);
+      if (!failure_) failure_ = std::current_exception();
+      changed_.notify_all();
+    }
+  }
+
+  SteadyClip& clip_;
+  const int depth_;
+  const std::int64_t count_;
+  const std::int64_t window_;  // frames that may be ahead of the one wanted
+  std::mutex mutex_;           // guards all below but the threads
+  std::condition_variable changed_;
+  std::int64_t next_ = 0, taken_ = 0;
+  std::map<std::int64_t, FramePixels> done_;
+  std::exception_ptr failure_;
+  bool stopped_ = false;
+  std::vector<std::thread> threads_;
+};
+
+void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer& pixels) {
+  const std::ptrdiff_t row_bytes = pixels.world().row_bytes;
+  switch (pixels.world().format) {
+    case HX_FORMAT_ARGB8:
+      return writer.Write(frame, pixels.row<HX_Pixel8>(0), row_bytes);
+    case HX_FORMAT_ARGB16:
+      return writer.Write(frame, pixels.row<HX_Pixel16>(0), row_bytes);
+    default:
+      return writer.Write(frame, pixels.row<HX_PixelFloat>(0), row_bytes);
+  }
+}
+
+}  // namespace
+
+void RenderClip(SteadyClip& clip, int depth, int threads, media::ClipWriter& writer,
+                ProgressLine& progress) {
+  const media::ClipInfo& info = clip.info();
+  if (depth == 0) depth = info.bit_depth > 8 ? 16 : 8;
+  if (threads == 0) threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
+  constexpr int kMostInWork = 8;  // each holds some frames; the strips of one use all processors
+  RenderAhead frames(clip, depth, std::min(threads, kMostInWork));
+  Progress shown{"rendering", 0, static_cast<double>(info.frame_count), "frames", "", false};
+  for (std::size_t frame = 0; frame < info.frame_count; ++frame) {
+    if (InterruptAsked()) throw Interrupted();
+    shown.done = static_cast<double>(frame);
+    progress.Show(shown);
+    Write(writer, frame, *frames.Take(static_cast<std::int64_t>(frame)));
+  }
+  clip.CheckMedia();
+  shown.done = shown.total;
+  shown.ends = true;
+  progress.Show(shown);
+}
+
+}  // namespace calmframe

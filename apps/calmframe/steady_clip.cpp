@@ -1,0 +1,146 @@
+#include "apps/calmframe/steady_clip.h"
+
+#include <boost/make_shared.hpp>
+#include <chrono>
+#include <cstdio>
+#include <utility>
+
+#include "apps/calmframe/failures.h"
+#include "apps/calmframe/plugin_path.h"
+
+namespace calmframe {
+namespace {
+
+// Disk ids of the effect's parameters.
+constexpr std::int32_t kCancelButton = 11;
+constexpr std::int32_t kStabilizationGroup = 12;
+
+// The effect's words for what its status counter tells when it has ended without a result.
+enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
+
+// A tracking window of the least size needs that much.
+constexpr int kLeastSide = 20;
+
+media::ClipInfo InfoOf(const std::string& path) {
+  const media::ClipInfo info = media::ClipReader::Open(path)->info();
+  if (info.width < kLeastSide || info.height < kLeastSide) {
+    throw media::Failure(media::Failure::Side::input, path + ": " + std::to_string(info.width) +
+                                                          " by " + std::to_string(info.height) +
+                                                          " pixels are too few to stabilize");
+  }
+  return info;
+}
+
+host::HostSettings SettingsFor(const media::ClipInfo& info, const ControlFlags& controls) {
+  ShowExperimentalParameters(controls);
+  host::HostSettings settings;
+  // A walk from the first frame to the last needs what is ahead of it and little more.
+  constexpr std::size_t kFrames = 16;
+  settings.media.cache_bytes =
+      kFrames * static_cast<std::size_t>(info.width) * static_cast<std::size_t>(info.height) * 4;
+  return settings;
+}
+
+// "42% (frame 126 of 300)", as the effect shows it on its Cancel button.
+bool ParseFrames(const std::string& says, double* done, double* total) {
+  int percent = 0, frame = 0, count = 0;
+  const std::size_t of = says.find(" of ");
+  if (of == std::string::npos ||
+      std::sscanf(says.c_str(), "%d%% (frame %d", &percent, &frame) != 2 ||
+      std::sscanf(says.c_str() + of, " of %d", &count) != 1) {
+    return false;
+  }
+  *done = frame;
+  *total = count;
+  return true;
+}
+
+std::string FailureText(int status, const std::vector<std::string>& messages) {
+  if (!messages.empty()) return messages.back();
+  switch (status) {
+    case kAnalysisFailed:
+      return "the clip could not be analysed";
+    case kSolveFailed:
+      return "the motion of this clip could not be solved";
+    default:
+      return "the effect has no result for this clip (status " + std::to_string(status) + ")";
+  }
+}
+
+}  // namespace
+
+SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls) try
+    : info_(InfoOf(path)),
+      host_(PluginPath(), SettingsFor(info_, controls)),
+      values_(ResolveControls(controls, host_.declarations())),
+      session_(host_) {
+  const auto layer = boost::make_shared<host::Layer>(host::OpenClip(path));
+  layer->Change([&](host::LayerState& state) { state.name = state.file_name = path; });
+  effect_ = &session_.Apply(layer);
+  if (!effect_->creation().ok()) throw SolveFailure(effect_->creation().Line(path));
+  for (const auto& [disk_id, value] : values_) {
+    const host::CommandResult result = effect_->SetParam(effect_->IndexOf(disk_id), value);
+    if (!result.ok()) throw SolveFailure(result.Line(path));
+  }
+} catch (const host::PluginError& error) {
+  throw SolveFailure(error.what());
+}
+
+void SteadyClip::Work(ProgressLine& progress) {
+  using Work = host::Session::Work;
+  Progress shown;
+  const auto show = [&] {
+    const Work work = host::Session::WorkOf(*effect_);
+    const std::string stage = work == Work::analysing ? "analyzing"
+                              : work == Work::solving ? "solving"
+                                                      : "";
+    if (stage != shown.stage && !shown.stage.empty()) {
+      shown.ends = true;
+      shown.done = shown.total;
+      progress.Show(shown);
+      shown = {};
+    }
+    if (!stage.empty()) {
+      shown.stage = stage;
+      shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
+      if (ParseFrames(shown.says, &shown.done, &shown.total)) shown.unit = "frames";
+      progress.Show(shown);
+    }
+    return InterruptAsked();
+  };
+  const auto waited = session_.TickUntilSettled(std::chrono::hours(24 * 30), show);
+  if (waited != host::Session::Wait::settled) throw Interrupted();
+  show();
+  CheckMedia();
+  const std::vector<std::string> messages = effect_->TakeMessages();
+  const int status = host::Session::StatusOf(*effect_);
+  if (status != kReady) throw SolveFailure(FailureText(status, messages));
+  for (const std::string& message : messages) progress.Warn(message);
+}
+
+std::unique_ptr<CropWindow> SteadyClip::Crop() {
+  const HX_GetStabilizerData get = host_.library().exports().get_stabilizer_data;
+  const void* block = host_.opaque_data().Peek(effect_->shared()->reference());
+  constexpr std::int32_t kUntouched = -1;
+  std::int32_t frames, first, columns, rows, width = kUntouched, height = kUntouched, w, h;
+  float left, top, right, bottom;
+  if (!get ||
+      !get(block, &frames, &first, &columns, &rows, &width, &height, &left, &top, &right, &bottom,
+           &w, &h) ||
+      width == kUntouched) {
+    return nullptr;
+  }
+  return std::make_unique<CropWindow>(CropWindow{width, height});
+}
+
+std::string SteadyClip::NameOf(std::int32_t disk_id) const {
+  const auto param = effect_->Param(effect_->IndexOf(disk_id));
+  return param ? param->name : "";
+}
+
+void SteadyClip::CheckMedia() {
+  const std::string failure = host_.media().failure();
+  if (!failure.empty()) throw media::Failure(media::Failure::Side::input, failure);
+}
+
+}  // namespace calmframe

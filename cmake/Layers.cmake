@@ -1,0 +1,51 @@
+# Proof that a folder keeps to its layers. What a configure can see of a target's links is checked at configure time;
+# includes change between configures, so they are a test.
+
+# All targets of a folder and of those below it.
+function(calmframe_targets_below folder result)
+  get_property(targets DIRECTORY "${folder}" PROPERTY BUILDSYSTEM_TARGETS)
+  get_property(subfolders DIRECTORY "${folder}" PROPERTY SUBDIRECTORIES)
+  foreach(subfolder IN LISTS subfolders)
+    calmframe_targets_below("${subfolder}" below)
+    list(APPEND targets ${below})
+  endforeach()
+  set(${result} ${targets} PARENT_SCOPE)
+endfunction()
+
+# calmframe_layer(FOLDER host MEETS platform): targets and sources of the folder reach no other folder's, directly or by
+# what they link. To be called when all folders have been added.
+function(calmframe_layer)
+  cmake_parse_arguments(ARG "" "FOLDER" "MEETS" ${ARGN})
+  set(allowed ${ARG_FOLDER} ${ARG_MEETS})
+  calmframe_targets_below("${CMAKE_SOURCE_DIR}/${ARG_FOLDER}" waiting)
+  set(seen)
+  while(waiting)
+    list(POP_FRONT waiting target)
+    if(target IN_LIST seen OR NOT TARGET "${target}")
+      continue()
+    endif()
+    list(APPEND seen "${target}")
+    get_target_property(imported "${target}" IMPORTED)
+    if(imported)
+      continue()
+    endif()
+    get_target_property(place "${target}" SOURCE_DIR)
+    file(RELATIVE_PATH place "${CMAKE_SOURCE_DIR}" "${place}")
+    string(REGEX REPLACE "/.*" "" top "${place}")
+    if(NOT top IN_LIST allowed)
+      message(FATAL_ERROR "${ARG_FOLDER}/ reaches the target ${target} of ${place}/; it may meet ${allowed}")
+    endif()
+    foreach(property LINK_LIBRARIES INTERFACE_LINK_LIBRARIES)
+      get_target_property(links "${target}" ${property})
+      if(links)
+        list(APPEND waiting ${links})
+      endif()
+    endforeach()
+  endwhile()
+  if(CALMFRAME_TESTS)
+    string(JOIN "," allowed_text ${allowed})
+    add_test(NAME layers.${ARG_FOLDER}_includes
+      COMMAND "${CMAKE_COMMAND}" -DROOT=${CMAKE_SOURCE_DIR} -DFOLDER=${ARG_FOLDER} -DALLOWED=${allowed_text}
+        -P "${CMAKE_SOURCE_DIR}/cmake/CheckIncludes.cmake")
+  endif()
+endfunction()

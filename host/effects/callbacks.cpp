@@ -1,0 +1,179 @@
+#include <algorithm>
+#include <cstdarg>
+#include <cstdio>
+#include <cstring>
+
+#include "host/effects/interface_guard.h"
+#include "host/effects/interface_tables.h"
+#include "host/effects/layer_time.h"
+#include "host/pixels/world_operations.h"
+#include "platform/tessel/utility.h"
+
+namespace calmframe::host {
+namespace {
+
+constexpr std::size_t kFormatSize = 512;  // of the callers' buffers
+
+HX_Err CheckoutInput(Instance& instance, std::int32_t time, std::uint32_t time_scale,
+                     HX_ParamDef& param) {
+  if (!instance.frames() || time_scale == 0) return HX_ERR_UNKNOWN;
+  const LayerTime layer(instance.frames()->layer());
+  const HX_World* world = instance.frames()->CheckOutInput(layer.MediaTicks(time, time_scale));
+  if (!world) return HX_ERR_UNKNOWN;
+  param = {};
+  param.kind = HX_PARAM_LAYER;
+  param.u.ld = *world;
+  return HX_ERR_NONE;
+}
+
+HX_Err CheckoutParam(HX_EffectRef effect, std::int32_t index, std::int32_t time, std::int32_t,
+                     std::uint32_t time_scale, HX_ParamDef* param) {
+  return WithInstance("checkout_param", effect, [&](Host& host, Instance& instance) -> HX_Err {
+    if (index == 0) {
+      if (const HX_Err code = CheckoutInput(instance, time, time_scale, *param)) return code;
+    } else {
+      const std::optional<HX_ParamDef> found = instance.Param(index);
+      if (!found) return HX_ERR_UNKNOWN;
+      *param = *found;
+    }
+    host.CountParamCheckout(1);
+    return HX_ERR_NONE;
+  });
+}
+
+HX_Err CheckinParam(HX_EffectRef effect, HX_ParamDef* param) {
+  Host* host = Host::active();
+  if (!host) return HX_ERR_UNKNOWN;
+  host->CountParamCheckout(-1);
+  if (param->kind != HX_PARAM_LAYER) return HX_ERR_NONE;
+  const std::shared_ptr<Instance> instance = host->instances().Find(effect);
+  if (!instance || !instance->frames()) return HX_ERR_UNKNOWN;
+  instance->frames()->CheckInInput(param->u.ld.data);
+  return HX_ERR_NONE;
+}
+
+HX_Err AddParam(HX_EffectRef, std::int32_t index, const HX_ParamDef* param) {
+  return WithHost("add_param", [&](Host& host) { return host.AddParam(index, *param); });
+}
+
+HX_Err OpenStrings(HX_EffectRef, std::uint32_t number, const HX_StringTable* table,
+                   std::uint64_t* token) {
+  return WithHost("open_strings", [&](Host& host) -> HX_Err {
+    if (!table || table->number != number) return HX_ERR_UNKNOWN;
+    *token = host.OpenStrings(*table);
+    return HX_ERR_NONE;
+  });
+}
+
+const char* GetString(std::uint64_t token, std::int32_t index, std::int32_t, std::int32_t) {
+  const Host* host = Host::active();
+  return host ? host->GetString(token, index) : nullptr;
+}
+
+void CloseStrings(std::uint64_t token) {
+  if (Host* host = Host::active()) host->CloseStrings(token);
+}
+
+HX_Handle NewHandle(std::uint64_t size) {
+  HX_Handle handle = nullptr;
+  WithHost("new_handle", [&](Host& host) -> HX_Err {
+    handle = host.handles().New(size);
+    return HX_ERR_NONE;
+  });
+  return handle;
+}
+
+void* LockHandle(HX_Handle handle) {
+  void* block = nullptr;
+  WithHost("lock_handle", [&](Host& host) -> HX_Err {
+    block = host.handles().Lock(handle);
+    return HX_ERR_NONE;
+  });
+  return block;
+}
+
+void UnlockHandle(HX_Handle handle) {
+  if (Host* host = Host::active()) host->handles().Unlock(handle);
+}
+
+void DisposeHandle(HX_Handle handle) {
+  if (Host* host = Host::active()) host->handles().Dispose(handle);
+}
+
+HX_Err ResizeHandle(HX_Handle* handle, std::uint64_t size) {
+  return WithHost("resize_handle",
+                  [&](Host& host) { return host.handles().Resize(*handle, size); });
+}
+
+std::uint64_t HandleSize(HX_Handle handle) {
+  Host* host = Host::active();
+  return host ? host->handles().Size(handle) : 0;
+}
+
+#if defined(__GNUC__)
+__attribute__((format(printf, 2, 3)))
+#endif
+std::int32_t
+Format(char* buffer, const char* text, ...) {
+  va_list values;
+  va_start(values, text);
+  const int size = std::vsnprintf(buffer, kFormatSize, text, values);
+  va_end(values);
+  if (size < 0) buffer[0] = '\0';
+  return std::clamp(size, 0, static_cast<int>(kFormatSize) - 1);
+}
+
+void CopyText(char* to, std::uint32_t size, const char* from) {
+  if (size == 0) return;
+  try {
+    const std::string text = tessel::utility::CutToBytes(from ? from : "", size - 1);
+    std::memcpy(to, text.c_str(), text.size() + 1);
+  } catch (...) {
+    to[0] = '\0';
+  }
+}
+
+HX_Err CopyWorldCallback(HX_EffectRef, const HX_World* from, HX_World* to, const HX_Rect* from_rect,
+                         const HX_Rect* to_rect) {
+  return WithHost("copy_world", [&](Host&) { return CopyWorld(*from, *to, from_rect, to_rect); });
+}
+
+HX_Err TransferCallback(HX_EffectRef, const HX_World* from, const HX_TransferMode* mode,
+                        const void* mask, std::int32_t x, std::int32_t y, HX_World* to) {
+  return WithHost("transfer", [&](Host&) -> HX_Err {
+    return mask ? HX_ERR_UNKNOWN : Transfer(*from, *mode, x, y, *to);
+  });
+}
+
+// Begin and end of a direct render; the table's rows mean nothing to this host. An end that is made
+// to fail has ended the render all the same.
+HX_Err Utility(HX_EffectRef, std::int32_t operation, const void* table) {
+  if (operation == HX_UTILITY_END_RENDER) {
+    if (Host* host = Host::active()) host->CountDirectRender(-1);
+  }
+  return WithHost("utility", [&](Host& host) -> HX_Err {
+    if (operation == HX_UTILITY_END_RENDER) return HX_ERR_NONE;
+    if (operation != HX_UTILITY_BEGIN_RENDER || !table) return HX_ERR_UNKNOWN;
+    host.CountDirectRender(1);
+    return HX_ERR_NONE;
+  });
+}
+
+HX_Err HlsToRgb(HX_EffectRef, const std::int32_t hls[3], HX_Pixel8* rgb) {
+  return WithHost("hls_to_rgb", [&](Host&) -> HX_Err {
+    *rgb = ColourOfHls(hls);
+    return HX_ERR_NONE;
+  });
+}
+
+}  // namespace
+
+const HX_Callbacks& Callbacks() {
+  static const HX_Callbacks callbacks = {
+      CheckoutParam, CheckinParam, AddParam,          OpenStrings,      GetString,    CloseStrings,
+      NewHandle,     LockHandle,   UnlockHandle,      DisposeHandle,    ResizeHandle, HandleSize,
+      Format,        CopyText,     CopyWorldCallback, TransferCallback, Utility,      HlsToRgb};
+  return callbacks;
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,119 @@
+#include "host/effects/effect.h"
+
+#include <utility>
+
+#include "host/effects/host.h"
+
+namespace calmframe::host {
+
+Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position)
+    : host_(host),
+      shared_(std::make_shared<TimelineEffect>(std::move(layer), host.declarations())),
+      instance_(Instance::Make(host, shared_)) {
+  PutOnLayer(position);
+  creation_ = Command(HX_CMD_CREATE_INSTANCE);
+  Refresh();
+  standing_ = MakeRenderer();
+}
+
+Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position,
+               const SavedEffect& saved)
+    : host_(host),
+      shared_(std::make_shared<TimelineEffect>(std::move(layer), host.declarations())),
+      instance_(Instance::Make(host, shared_)) {
+  shared_->params().SetValues(saved.values);
+  PutOnLayer(position);
+  if (saved.match_name != host.library().properties().match_name) {
+    creation_ = {HX_ERR_UNKNOWN, "Saved by another effect: " + saved.match_name};
+  } else if (saved.instance.empty()) {
+    creation_ = Command(HX_CMD_CREATE_INSTANCE);
+  } else {
+    flattened_ = host.handles().NewFrom(saved.instance);
+    instance_->SetHandle(flattened_);
+    creation_ = Restore();
+  }
+  Refresh();
+  standing_ = MakeRenderer();
+}
+
+Effect::~Effect() {
+  const Host::LoopCall on_loop;
+  instance_->Destroy({playhead_});
+  standing_.reset();
+  shared_->layer()->RemoveEffect(shared_->runtime_id());
+}
+
+void Effect::PutOnLayer(std::size_t position) {
+  EffectOperator effect;
+  effect.runtime_id = shared_->runtime_id();
+  effect.match_name = host_.library().properties().match_name;
+  effect.parameters = shared_->params().SettingsText();
+  shared_->layer()->InsertEffect(position, effect);
+}
+
+CommandResult Effect::Command(std::uint32_t command, void* extra) {
+  if (flattened_) {
+    if (CommandResult restored = Restore(); !restored.ok()) return restored;
+  }
+  const Host::LoopCall on_loop;
+  return instance_->Call(command, {playhead_}, nullptr, extra);
+}
+
+CommandResult Effect::Restore() {
+  const Host::LoopCall on_loop;
+  CommandResult result = instance_->Call(HX_CMD_RESTORE_INSTANCE, {playhead_});
+  // A plug-in that failed may have left the handle as it was; then it is tried again.
+  if (result.ok() || instance_->handle() != flattened_) flattened_ = nullptr;
+  return result;
+}
+
+CommandResult Effect::SetParam(std::int32_t index, double value) {
+  if (!shared_->params().SetByUser(index, value)) return {HX_ERR_UNKNOWN, "No such control"};
+  shared_->layer()->SetParameters(shared_->runtime_id(), shared_->params().SettingsText());
+  shared_->InvalidateRenders();
+  return TellChange(index);
+}
+
+CommandResult Effect::Press(std::int32_t index) {
+  const std::optional<HX_ParamDef> param = Param(index);
+  if (!param || param->kind != HX_PARAM_BUTTON) return {HX_ERR_UNKNOWN, "No such button"};
+  if (param->ui_flags & HX_PARAM_UI_DISABLED) {
+    return {HX_ERR_UNKNOWN, "The button is disabled"};
+  }
+  return TellChange(index);
+}
+
+CommandResult Effect::TellChange(std::int32_t index) {
+  CommandResult result;
+  if (Param(index)->flags & HX_PARAM_FLAG_SUPERVISED) {
+    HX_ParamChangedExtra extra{index};
+    result = Command(HX_CMD_PARAM_CHANGED, &extra);
+  }
+  const CommandResult refreshed = Refresh();
+  return result.ok() ? refreshed : result;
+}
+
+CommandResult Effect::Tick() {
+  return Command(HX_CMD_IDLE_TICK);
+}
+
+CommandResult Effect::Refresh() {
+  return Command(HX_CMD_REFRESH_PARAMS);
+}
+
+CommandResult Effect::Save(SavedEffect* saved) {
+  CommandResult result = Command(HX_CMD_FLATTEN_INSTANCE);
+  if (!result.ok()) return result;
+  SavedEffect now;
+  now.match_name = host_.library().properties().match_name;
+  now.values = shared_->params().Values();
+  if (instance_->handle()) {
+    flattened_ = instance_->handle();
+    now.instance = host_.handles().BytesOf(flattened_);
+    result = Restore();
+  }
+  *saved = std::move(now);
+  return result;
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,291 @@
+#include <algorithm>
+#include <cstring>
+#include <map>
+#include <utility>
+#include <vector>
+
+#include "host/effects/interface_guard.h"
+#include "host/effects/interface_tables.h"
+#include "host/pixels/world_operations.h"
+#include "platform/hx/hx_suites.h"
+#include "platform/tessel/utility.h"
+
+namespace calmframe::host {
+namespace {
+
+// Cut between characters, with the terminating zero.
+void CopyUTF16(const std::string& text, std::uint16_t* to, std::uint32_t max) {
+  if (max == 0) return;
+  const std::u16string units = tessel::utility::ToUTF16(text);
+  std::size_t size = std::min<std::size_t>(units.size(), max - 1);
+  if (size > 0 && size < units.size() && (units[size - 1] & 0xfc00) == 0xd800) --size;
+  std::copy_n(units.begin(), size, to);
+  to[size] = 0;
+}
+
+// -- Param Utils --
+
+HX_Err UpdateParamUI(HX_EffectRef effect, std::int32_t index, const HX_ParamDef* param) {
+  return WithInstance(
+      "Param Utils.UpdateParamUI", effect, [&](Host&, Instance& instance) -> HX_Err {
+        return instance.effect()->params().UpdateUI(index, *param) ? HX_ERR_NONE : HX_ERR_UNKNOWN;
+      });
+}
+
+HX_Err SetParamValue(HX_EffectRef effect, std::int32_t index, const HX_ParamDef* param) {
+  return WithInstance("Param Utils.SetParamValue", effect,
+                      [&](Host&, Instance& instance) -> HX_Err {
+                        if (!instance.effect()->params().SetByPlugin(index, *param)) {
+                          return HX_ERR_UNKNOWN;
+                        }
+                        instance.effect()->InvalidateRenders();
+                        return HX_ERR_NONE;
+                      });
+}
+
+constexpr HX_ParamUtilsSuite3 kParamUtils = {UpdateParamUI, SetParamValue};
+
+// -- Utility --
+
+template <typename Value, typename Get>
+HX_Err Tell(const char* operation, HX_EffectRef effect, Value* value, Get get) {
+  return WithInstance(operation, effect, [&](Host&, Instance& instance) -> HX_Err {
+    *value = get(*instance.effect(), *instance.effect()->layer()->state());
+    return HX_ERR_NONE;
+  });
+}
+
+template <typename Get>
+HX_Err TellText(const char* operation, HX_EffectRef effect, std::uint16_t* text, std::uint32_t max,
+                Get get) {
+  return WithInstance(operation, effect, [&](Host& host, Instance& instance) -> HX_Err {
+    CopyUTF16(get(host, *instance.effect()->layer()->state()), text, max);
+    return HX_ERR_NONE;
+  });
+}
+
+HX_Err GetEffectReference(HX_EffectRef effect, std::uint64_t* reference) {
+  return Tell("Utility.GetEffectReference", effect, reference,
+              [](TimelineEffect& own, const LayerState&) { return own.reference(); });
+}
+HX_Err GetRuntimeInstanceID(HX_EffectRef effect, std::uint32_t* id) {
+  return Tell("Utility.GetRuntimeInstanceID", effect, id,
+              [](TimelineEffect& own, const LayerState&) { return own.runtime_id(); });
+}
+HX_Err GetTicksPerFrame(HX_EffectRef effect, std::int64_t* ticks) {
+  return Tell("Utility.GetTicksPerFrame", effect, ticks,
+              [](TimelineEffect&, const LayerState& layer) { return layer.ticks_per_frame; });
+}
+HX_Err GetStartFrame(HX_EffectRef effect, std::int32_t* frame) {
+  return Tell("Utility.GetStartFrame", effect, frame,
+              [](TimelineEffect&, const LayerState& layer) { return layer.start_frame; });
+}
+HX_Err GetFrameCount(HX_EffectRef effect, std::int32_t* count) {
+  return Tell("Utility.GetFrameCount", effect, count,
+              [](TimelineEffect&, const LayerState& layer) { return layer.length; });
+}
+HX_Err GetFieldType(HX_EffectRef effect, std::int32_t* field) {
+  return Tell("Utility.GetFieldType", effect, field,
+              [](TimelineEffect&, const LayerState& layer) { return layer.field_type; });
+}
+HX_Err GetLayerName(HX_EffectRef effect, std::uint16_t* text, std::uint32_t max) {
+  return TellText("Utility.GetLayerName", effect, text, max,
+                  [](Host&, const LayerState& layer) { return layer.name; });
+}
+HX_Err GetLayerFileName(HX_EffectRef effect, std::uint16_t* text, std::uint32_t max) {
+  return TellText("Utility.GetLayerFileName", effect, text, max,
+                  [](Host&, const LayerState& layer) { return layer.file_name; });
+}
+HX_Err GetProjectPath(HX_EffectRef effect, std::uint16_t* text, std::uint32_t max) {
+  return TellText("Utility.GetProjectPath", effect, text, max,
+                  [](Host& host, const LayerState&) { return host.settings().project_path; });
+}
+HX_Err GetSourceID(HX_EffectRef effect, HX_Guid* id) {
+  return Tell("Utility.GetSourceID", effect, id,
+              [](TimelineEffect&, const LayerState&) { return HX_Guid{}; });
+}
+
+constexpr HX_UtilitySuite kUtility = {
+    GetEffectReference, GetRuntimeInstanceID, GetTicksPerFrame, GetStartFrame,  GetFrameCount,
+    GetFieldType,       GetLayerName,         GetLayerFileName, GetProjectPath, GetSourceID};
+
+// -- Private Effect --
+
+HX_Err ConvertText(const std::uint16_t* from, char* to, std::uint32_t max) {
+  return WithHost("Private Effect.ConvertText", [&](Host&) -> HX_Err {
+    std::u16string text;
+    for (; *from; ++from) text += static_cast<char16_t>(*from);
+    Callbacks().copy_text(to, max, tessel::utility::ToUTF8(text).c_str());
+    return HX_ERR_NONE;
+  });
+}
+
+HX_Err GetLayerData(HX_EffectRef effect, std::int32_t, void*) {
+  return WithInstance("Private Effect.GetLayerData", effect,
+                      [](Host&, Instance&) -> HX_Err { return HX_ERR_UNKNOWN; });
+}
+
+HX_Err ReservedOfEffect(HX_EffectRef) {
+  return HX_ERR_UNKNOWN;
+}
+
+HX_Err ForceRerender(HX_EffectRef effect) {
+  return WithHost("Private Effect.ForceRerender", [&](Host& host) -> HX_Err {
+    if (const std::shared_ptr<Instance> instance = host.instances().Find(effect)) {
+      instance->effect()->InvalidateRenders();
+      host.Wake();
+    }
+    return HX_ERR_NONE;
+  });
+}
+
+constexpr HX_PrivateEffectSuite3 kPrivateEffect = {ConvertText, GetLayerData, ReservedOfEffect,
+                                                   ReservedOfEffect, ForceRerender};
+
+// -- App, Adv App --
+
+HX_Err InvalidateRect(void*, const HX_Rect* rect) {
+  return WithHost("App.InvalidateRect", [&](Host& host) -> HX_Err {
+    host.user_interface().Invalidate(rect ? *rect : HX_Rect{});
+    return HX_ERR_NONE;
+  });
+}
+
+HX_Err RefreshAllWindows() {
+  return WithHost("Adv App.RefreshAllWindows", [](Host& host) -> HX_Err {
+    host.user_interface().Refresh();
+    return HX_ERR_NONE;
+  });
+}
+
+HX_Err InfoText(const char* line1, const char* line2) {
+  return WithHost("Adv App.InfoText", [&](Host& host) -> HX_Err {
+    if (line1 || line2) {
+      host.user_interface().SetInfo(line1 ? line1 : "", line2 ? line2 : "");
+    } else {
+      host.user_interface().ClearInfo();
+    }
+    return HX_ERR_NONE;
+  });
+}
+
+constexpr HX_AppSuite6 kApp = {InvalidateRect};
+constexpr HX_AdvAppSuite1 kAdvApp = {RefreshAllWindows, InfoText};
+
+// -- World, Blur --
+
+HX_Err NewWorld(HX_EffectRef, std::int32_t width, std::int32_t height, std::uint8_t clear,
+                std::uint32_t format, HX_World* world) {
+  return WithHost("World.NewWorld", [&](Host& host) {
+    return host.worlds().New(width, height, clear != 0, format, world);
+  });
+}
+
+// Not to be failed: who gives back a world can't do more about it.
+HX_Err DisposeWorld(HX_EffectRef, HX_World* world) {
+  Host* host = Host::active();
+  return host ? host->worlds().Dispose(world) : HX_ERR_UNKNOWN;
+}
+
+HX_Err BlurOperation(HX_EffectRef, const HX_World* from, HX_World* to, float radius, std::int32_t,
+                     std::int32_t, std::int32_t, std::int32_t) {
+  return WithHost("Blur.Blur", [&](Host&) { return Blur(*from, *to, radius); });
+}
+
+constexpr HX_WorldSuite2 kWorld = {NewWorld, DisposeWorld};
+constexpr HX_BlurSuite1 kBlur = {BlurOperation};
+
+// -- Analysis Host, Stabilizer Host --
+
+HX_Err CancelJob(HX_EffectRef) {
+  return WithHost("Analysis Host.CancelJob", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+}
+HX_Err ReportJobEnd(HX_EffectRef, std::uint8_t) {
+  return WithHost("Analysis Host.ReportJobEnd", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+}
+HX_Err IsScheduled(HX_EffectRef, std::uint8_t* scheduled) {
+  return WithHost("Analysis Host.IsScheduled", [&](Host&) -> HX_Err {
+    *scheduled = 0;
+    return HX_ERR_NONE;
+  });
+}
+HX_Err MayStart(HX_EffectRef, std::uint8_t* may) {
+  return WithHost("Analysis Host.MayStart", [&](Host&) -> HX_Err {
+    *may = 1;
+    return HX_ERR_NONE;
+  });
+}
+HX_Err GetCompressionPreference(std::uint8_t* raw) {
+  return WithHost("Analysis Host.GetCompressionPreference", [&](Host& host) -> HX_Err {
+    *raw = host.settings().keeps_analysis_raw ? 1 : 0;
+    return HX_ERR_NONE;
+  });
+}
+HX_Err ScheduleAnalysis(HX_EffectRef) {
+  return WithHost("Analysis Host.ScheduleAnalysis", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+}
+HX_Err GetRefusal(HX_EffectRef effect, std::uint16_t* text, std::uint32_t max) {
+  return TellText("Analysis Host.GetRefusal", effect, text, max,
+                  [](Host&, const LayerState& layer) { return layer.refusal; });
+}
+
+HX_Err SetFramePolygon(HX_EffectRef effect, std::uint32_t count, const float* xy,
+                       std::int32_t frame) {
+  return WithInstance("Stabilizer Host.SetFramePolygon", effect,
+                      [&](Host&, Instance& instance) -> HX_Err {
+                        const std::size_t size = std::size_t{count} * 2;
+                        instance.effect()->SetPolygon(frame, std::vector<float>(xy, xy + size));
+                        return HX_ERR_NONE;
+                      });
+}
+
+constexpr HX_AnalysisHostSuite1 kAnalysisHost = {
+    CancelJob,        ReportJobEnd, IsScheduled, MayStart, GetCompressionPreference,
+    ScheduleAnalysis, GetRefusal};
+constexpr HX_StabilizerHostSuite7 kStabilizerHost = {SetFramePolygon};
+
+// -- Opaque Effect Data --
+
+HX_Err FindOpaque(std::uint64_t reference, void** block) {
+  return WithHost("Opaque Effect Data.Find", [&](Host& host) -> HX_Err {
+    *block = host.opaque_data().Find(reference);
+    return HX_ERR_NONE;
+  });
+}
+HX_Err SetOpaque(std::uint64_t reference, void* block, void** winner) {
+  return WithHost("Opaque Effect Data.Set", [&](Host& host) -> HX_Err {
+    *winner = host.opaque_data().Set(reference, block);
+    return HX_ERR_NONE;
+  });
+}
+// Not to be failed: a use that stays would keep the block for ever.
+HX_Err ReleaseOpaque(std::uint64_t reference, std::uint8_t* last) {
+  Host* host = Host::active();
+  if (!host) return HX_ERR_UNKNOWN;
+  *last = host->opaque_data().Release(reference) ? 1 : 0;
+  return HX_ERR_NONE;
+}
+
+constexpr HX_OpaqueEffectDataSuite1 kOpaqueEffectData = {FindOpaque, SetOpaque, ReleaseOpaque};
+
+}  // namespace
+
+const void* FindEffectSuite(const std::string& name, std::int32_t version) {
+  static const std::map<std::pair<std::string, std::int32_t>, const void*> suites = {
+      {{HX_PARAM_UTILS_SUITE, HX_PARAM_UTILS_SUITE_VERSION}, &kParamUtils},
+      {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_3}, &kUtility},
+      {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_4}, &kUtility},
+      {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_5}, &kUtility},
+      {{HX_PRIVATE_EFFECT_SUITE, HX_PRIVATE_EFFECT_SUITE_VERSION}, &kPrivateEffect},
+      {{HX_APP_SUITE, HX_APP_SUITE_VERSION}, &kApp},
+      {{HX_ADV_APP_SUITE, HX_ADV_APP_SUITE_VERSION}, &kAdvApp},
+      {{HX_WORLD_SUITE, HX_WORLD_SUITE_VERSION}, &kWorld},
+      {{HX_BLUR_SUITE, HX_BLUR_SUITE_VERSION}, &kBlur},
+      {{HX_ANALYSIS_HOST_SUITE, HX_ANALYSIS_HOST_SUITE_VERSION}, &kAnalysisHost},
+      {{HX_STABILIZER_HOST_SUITE, HX_STABILIZER_HOST_SUITE_VERSION}, &kStabilizerHost},
+      {{HX_OPAQUE_EFFECT_DATA_SUITE, HX_OPAQUE_EFFECT_DATA_SUITE_VERSION}, &kOpaqueEffectData}};
+  const auto found = suites.find({name, version});
+  return found == suites.end() ? nullptr : found->second;
+}
+
+}  // namespace calmframe::host

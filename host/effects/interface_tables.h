@@ -1,0 +1,22 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+
+#include "platform/hx/hx_effect.h"
+
+namespace calmframe::host {
+
+// The interface's C functions; they work on Host::active(). Every one that can fail passes through
+// Operations::Begin, and no exception leaves them.
+const HX_Callbacks& Callbacks();
+const HX_BasicSuite& BasicSuite();
+
+// The functions of the render commands' extra records.
+void SetPlanFunctions(HX_PlanExtra& plan);
+void SetRenderFunctions(HX_RenderExtra& render);
+
+// Tables of the suites that are not the media services'; null for an unknown name or version.
+const void* FindEffectSuite(const std::string& name, std::int32_t version);
+
+}  // namespace calmframe::host

@@ -1,0 +1,173 @@
+#include "host/effects/renderer.h"
+
+#include <optional>
+#include <utility>
+
+#include "host/base/operations.h"
+#include "host/effects/host.h"
+#include "host/effects/interface_tables.h"
+#include "host/effects/layer_time.h"
+#include "host/pixels/world_operations.h"
+
+namespace calmframe::host {
+namespace {
+
+constexpr HX_Err kBadRequest = HX_ERR_UNKNOWN;
+// More than any frame; a plug-in that asks for it is at fault.
+constexpr int kLargestSide = 1 << 17;
+
+bool Serves(const RenderRequest& request, bool planned) {
+  const bool depth =
+      request.bit_depth == 8 || request.bit_depth == 16 || (planned && request.bit_depth == 32);
+  const HX_Ratio& ratio = request.downsample;
+  return depth && ratio.num > 0 && static_cast<std::uint32_t>(ratio.num) <= ratio.den;
+}
+
+// Clear, and with the rectangle's top left for its origin; null for an empty one. Throws what
+// WorldBuffer throws.
+std::shared_ptr<WorldBuffer> OutputFor(Host& host, const HX_Rect& rect, int bit_depth) {
+  if (IsEmpty(rect)) return nullptr;
+  auto output =
+      std::make_shared<WorldBuffer>(rect.right - rect.left, rect.bottom - rect.top,
+                                    FormatOfDepth(bit_depth), host.worlds().row_padding());
+  output->world().origin_x = rect.left;
+  output->world().origin_y = rect.top;
+  return output;
+}
+
+void CheckPadding(const WorldBuffer& output, Host& host) {
+  if (host.worlds().row_padding() > 0 && !output.PaddingIntact()) {
+    Ledger::Get().Mistake("output: written behind its rows");
+  }
+}
+
+// A copy of what lies inside the rectangle; null when that is nothing.
+std::shared_ptr<WorldBuffer> PartOf(Host& host, const std::shared_ptr<WorldBuffer>& output,
+                                    const HX_Rect& rect, int bit_depth) {
+  const HX_Rect whole = output->rect();
+  auto part = OutputFor(host, Intersect(whole, rect), bit_depth);
+  if (!part) return nullptr;
+  const HX_Rect place = {whole.left - part->rect().left, whole.top - part->rect().top,
+                         whole.right - part->rect().left, whole.bottom - part->rect().top};
+  CopyWorld(output->world(), part->world(), nullptr, &place);
+  return part;
+}
+
+bool IsAbsurd(const HX_Rect& rect) {
+  return std::int64_t{rect.right} - rect.left > kLargestSide ||
+         std::int64_t{rect.bottom} - rect.top > kLargestSide;
+}
+
+}  // namespace
+
+std::shared_ptr<WorldBuffer> RenderedFrame::OnLayer() const {
+  const std::uint32_t format = pixels ? pixels->world().format : HX_FORMAT_ARGB8;
+  if (pixels && pixels->world().origin_x == 0 && pixels->world().origin_y == 0 &&
+      pixels->world().width == layer_width && pixels->world().height == layer_height) {
+    return pixels;
+  }
+  auto frame = std::make_shared<WorldBuffer>(layer_width, layer_height, format);
+  if (pixels) {
+    const HX_Rect place = pixels->rect();
+    CopyWorld(pixels->world(), frame->world(), nullptr, &place);
+  }
+  return frame;
+}
+
+Renderer::Renderer(Host& host, std::shared_ptr<TimelineEffect> effect)
+    : host_(host), instance_(Instance::Make(host, std::move(effect))) {
+  result_ = instance_->Call(HX_CMD_RESTORE_INSTANCE, {});
+}
+
+Renderer::~Renderer() {
+  instance_->Destroy({});
+}
+
+RenderedFrame Renderer::Direct(const RenderRequest& request) {
+  RenderedFrame rendered;
+  rendered.generation = instance_->effect()->generation();
+  if (!Serves(request, false)) {
+    rendered.result.code = kBadRequest;
+    return rendered;
+  }
+  RenderContext frames(host_.media(), instance_->ref(), instance_->effect()->layer()->state(),
+                       request.bit_depth, request.downsample, request.downsample);
+  frames.FreezeParams(instance_->effect()->params().All());
+  rendered.layer_width = frames.width();
+  rendered.layer_height = frames.height();
+
+  const LayerTime time(frames.layer());
+  const HX_World* input = frames.CheckOutInput(
+      time.MediaTicks(time.OfFrame(request.frame, request.second_field), time.scale()));
+  // Where the media has no frame the layer is clear.
+  std::optional<WorldBuffer> clear;
+  HX_World world =
+      input ? *input
+            : clear.emplace(frames.width(), frames.height(), FormatOfDepth(request.bit_depth))
+                  .world();
+  Instance::Place place{request.frame, request.second_field, &frames, &world};
+
+  HX_OutData setup{};
+  setup.width = frames.width();
+  setup.height = frames.height();
+  rendered.result = instance_->Call(HX_CMD_PREPARE_FRAME, place, nullptr, nullptr, &setup);
+  if (rendered.result.ok()) {
+    const std::int64_t left = -std::int64_t{setup.origin_x}, top = -std::int64_t{setup.origin_y};
+    rendered.full_rect = {static_cast<std::int32_t>(left), static_cast<std::int32_t>(top),
+                          static_cast<std::int32_t>(left + setup.width),
+                          static_cast<std::int32_t>(top + setup.height)};
+    if (IsAbsurd(rendered.full_rect)) {
+      rendered.result.code = kBadRequest;
+    } else if (auto output = OutputFor(host_, rendered.full_rect, request.bit_depth)) {
+      rendered.result = instance_->Call(HX_CMD_RENDER_FRAME, place, &output->world());
+      CheckPadding(*output, host_);
+      if (rendered.result.ok()) {
+        rendered.pixels =
+            request.part ? PartOf(host_, output, *request.part, request.bit_depth) : output;
+      }
+    }
+  }
+  if (input) frames.CheckInInput(input->data);
+  return rendered;
+}
+
+RenderedFrame Renderer::Planned(const RenderRequest& request) {
+  RenderedFrame rendered;
+  rendered.generation = instance_->effect()->generation();
+  if (!Serves(request, true)) {
+    rendered.result.code = kBadRequest;
+    return rendered;
+  }
+  RenderContext frames(host_.media(), instance_->ref(), instance_->effect()->layer()->state(),
+                       request.bit_depth, request.downsample, request.downsample);
+  frames.FreezeParams(instance_->effect()->params().All());
+  rendered.layer_width = frames.width();
+  rendered.layer_height = frames.height();
+  const Instance::Place place{request.frame, request.second_field, &frames, nullptr};
+
+  HX_PlanExtra plan{};
+  plan.request.rect = request.part.value_or(HX_Rect{0, 0, frames.width(), frames.height()});
+  plan.request.bit_depth = request.bit_depth;
+  SetPlanFunctions(plan);
+  rendered.result = instance_->Call(HX_CMD_PLAN_FRAME, place, nullptr, &plan);
+  if (!rendered.result.ok()) return rendered;
+  rendered.full_rect = plan.full_rect;
+  const HX_Rect wanted =
+      plan.may_exceed ? plan.result_rect : Intersect(plan.result_rect, plan.request.rect);
+  if (IsAbsurd(wanted)) {
+    rendered.result.code = kBadRequest;
+    return rendered;
+  }
+  frames.SetOutput(OutputFor(host_, wanted, request.bit_depth));
+  if (!frames.output()) return rendered;
+
+  HX_RenderExtra render{};
+  render.request = plan.request;
+  SetRenderFunctions(render);
+  rendered.result = instance_->Call(HX_CMD_RENDER_PLANNED_FRAME, place, nullptr, &render);
+  CheckPadding(*frames.output(), host_);
+  if (rendered.result.ok()) rendered.pixels = frames.output();
+  return rendered;
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,94 @@
+#include "host/timeline/frame_maker.h"
+
+#include <boost/make_shared.hpp>
+#include <cstring>
+#include <exception>
+
+#include "host/pixels/world_buffer.h"
+
+namespace calmframe::host {
+
+using tessel::utility::Guid;
+
+Guid IdentifierOf(const FrameRequest& request) {
+  const std::int64_t parts[] = {request.picture.frame, request.picture.parity,
+                                static_cast<std::int64_t>(request.kind), request.width,
+                                request.height};
+  return tessel::utility::MixHash(IdentityOf(request.node), parts, sizeof parts);
+}
+
+PicturePtr FrameMaker::Get(const FrameRequest& request, const FrameLayout& layout) {
+  const Guid identifier = IdentifierOf(request);
+  std::unique_lock lock(mutex_);
+  if (const PicturePtr cached = cache_.Find(identifier)) return cached;
+  boost::shared_ptr<Making>& place = makings_[identifier];
+  if (place) {
+    const boost::shared_ptr<Making> making = place;
+    made_.wait(lock, [&] { return making->done; });
+    return making->picture;
+  }
+  const boost::shared_ptr<Making> making = place = boost::make_shared<Making>();
+  lock.unlock();
+  PicturePtr picture;
+  try {
+    picture = Make(request, layout);
+    if (picture) picture = cache_.Insert(identifier, picture);
+  } catch (const std::exception& error) {
+    Keep(error.what());
+  } catch (...) {
+    Keep("a frame could not be made");
+  }
+  lock.lock();
+  making->picture = picture;
+  making->done = true;
+  makings_.erase(identifier);
+  made_.notify_all();
+  return picture;
+}
+
+PicturePtr FrameMaker::Make(const FrameRequest& request, const FrameLayout& layout) {
+  const LayerState& layer = *request.node.layer;
+  const PictureNumber& number = request.picture;
+  const PicturePtr whole = layer.source->Fetch(number.frame, request.kind);
+  if (!whole) return nullptr;
+  boost::shared_ptr<Picture> own;  // a copy, as soon as there is something to change
+  const auto writable = [&]() -> Picture& {
+    if (!own) own = Copy(*whole, {});
+    return *own;
+  };
+  for (std::size_t i = 0; i < request.node.level; ++i) {
+    if (layer.effects[i].draw) layer.effects[i].draw(number.frame, writable());
+  }
+  if (number.parity >= 0) KeepField(writable(), number.parity);
+  PicturePtr picture = own ? own : whole;
+  if (picture->width() != request.width || picture->height() != request.height) {
+    const auto scaled = pool_->NewPicture(request.kind, request.width, request.height);
+    ScalePicture(*picture, *scaled);
+    picture = scaled;
+  }
+  if (layout.padding != 0 || !layout.top_down) picture = Copy(*picture, layout);
+  return picture;
+}
+
+boost::shared_ptr<Picture> FrameMaker::Copy(const Picture& picture, const FrameLayout& layout) {
+  const boost::shared_ptr<Picture> copy = pool_->NewPicture(
+      picture.kind(), picture.width(), picture.height(), layout.padding, layout.top_down);
+  const std::size_t bytes = static_cast<std::size_t>(BytesPerPixel(FormatOf(picture.kind()))) *
+                            static_cast<std::size_t>(picture.width());
+  for (int y = 0; y < picture.height(); ++y) {
+    std::memcpy(copy->row<std::uint8_t>(y), picture.row<std::uint8_t>(y), bytes);
+  }
+  return copy;
+}
+
+std::string FrameMaker::failure() const {
+  std::lock_guard lock(mutex_);
+  return failure_;
+}
+
+void FrameMaker::Keep(const std::string& line) {
+  std::lock_guard lock(mutex_);
+  if (failure_.empty()) failure_ = line;
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,63 @@
+#pragma once
+
+#include <boost/shared_ptr.hpp>
+#include <condition_variable>
+#include <cstddef>
+#include <map>
+#include <mutex>
+#include <string>
+
+#include "host/timeline/frame_cache.h"
+#include "host/timeline/node_graph.h"
+
+namespace calmframe::host {
+
+// What a node delivers: a picture, at a size, in a depth.
+struct FrameRequest {
+  GraphNode node;
+  PictureNumber picture;
+  PixelKind kind = PixelKind::argb8;
+  int width = 0, height = 0;
+};
+
+// Names the frame: equal for equal requests, in every process.
+tessel::utility::Guid IdentifierOf(const FrameRequest& request);
+
+// How a new frame lies in memory.
+struct FrameLayout {
+  std::ptrdiff_t padding = 0;  // bytes behind each row
+  bool top_down = true;
+};
+
+// Makes the frames of the nodes and puts them into the cache. Any thread; two that want one frame
+// at the same time get it from one making.
+class FrameMaker {
+ public:
+  explicit FrameMaker(FrameCache& cache) : cache_(cache), pool_(PicturePool::Make()) {}
+
+  // From the cache, else made on this thread. Null where the media has no such frame, and on a
+  // failure.
+  PicturePtr Get(const FrameRequest& request, const FrameLayout& layout);
+
+  boost::shared_ptr<Picture> Copy(const Picture& picture, const FrameLayout& layout);
+
+  // The first failure's line; empty when there was none.
+  std::string failure() const;
+
+ private:
+  struct Making {
+    bool done = false;
+    PicturePtr picture;
+  };
+  PicturePtr Make(const FrameRequest& request, const FrameLayout& layout);
+  void Keep(const std::string& line);
+
+  FrameCache& cache_;
+  const boost::shared_ptr<PicturePool> pool_;
+  mutable std::mutex mutex_;
+  std::condition_variable made_;
+  std::map<tessel::utility::Guid, boost::shared_ptr<Making>> makings_;  // guarded by mutex_
+  std::string failure_;                                                 // guarded by mutex_
+};
+
+}  // namespace calmframe::host

@@ -1,0 +1,94 @@
+#include "host/timeline/render_queue.h"
+
+#include <algorithm>
+#include <limits>
+#include <utility>
+
+namespace calmframe::host {
+namespace {
+
+thread_local const RenderQueue* own_queue = nullptr;
+
+}  // namespace
+
+RenderQueue::RenderQueue(int threads) {
+  for (int i = 0; i < threads; ++i) threads_.emplace_back([this] { Run(); });
+}
+
+RenderQueue::~RenderQueue() {
+  Close();
+}
+
+std::int32_t RenderQueue::Post(Request request) {
+  std::int32_t id = 0;
+  {
+    std::lock_guard lock(mutex_);
+    if (closed_ || last_id_ == std::numeric_limits<std::int32_t>::max()) return 0;
+    id = last_id_ + 1;
+    waiting_.emplace_hint(waiting_.end(), id, std::move(request));
+    last_id_ = id;
+  }
+  changed_.notify_one();
+  return id;
+}
+
+void RenderQueue::Cancel(std::int32_t id, std::chrono::milliseconds delay) {
+  {
+    std::lock_guard lock(mutex_);
+    const auto found = waiting_.find(id);
+    if (found == waiting_.end()) return;
+    const Clock::time_point due = closed_ ? Clock::time_point{} : Clock::now() + delay;
+    cancelled_.emplace(due, std::move(found->second));
+    waiting_.erase(found);
+  }
+  changed_.notify_one();
+}
+
+void RenderQueue::Close() {
+  {
+    std::lock_guard lock(mutex_);
+    closed_ = true;
+  }
+  changed_.notify_all();
+  for (std::thread& thread : threads_) thread.join();
+  threads_.clear();
+}
+
+std::size_t RenderQueue::outstanding() const {
+  std::lock_guard lock(mutex_);
+  return waiting_.size() + cancelled_.size() + running_;
+}
+
+bool RenderQueue::IsOwnThread() const {
+  return own_queue == this;
+}
+
+void RenderQueue::RunOne(std::unique_lock<std::mutex>& lock, Request request, bool cancelled) {
+  ++running_;
+  lock.unlock();
+  request(cancelled);
+  request = nullptr;
+  lock.lock();
+  --running_;
+}
+
+void RenderQueue::Run() {
+  own_queue = this;
+  std::unique_lock lock(mutex_);
+  for (;;) {
+    const auto next = cancelled_.begin();
+    if (next != cancelled_.end() && (closed_ || next->first <= Clock::now())) {
+      RunOne(lock, std::move(cancelled_.extract(next).mapped()), true);
+    } else if (!waiting_.empty()) {
+      RunOne(lock, std::move(waiting_.extract(waiting_.begin()).mapped()), closed_);
+    } else if (closed_) {
+      return;
+    } else if (next != cancelled_.end()) {
+      changed_.wait_until(lock, next->first);
+    } else {
+      changed_.wait(lock);
+    }
+  }
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,85 @@
+#include <cstdint>
+#include <mutex>
+#include <shared_mutex>
+
+#include "platform/hx/hx_exports.h"
+#include "stabilizer/effect/src/shared_data.h"
+
+// What a renderer outside the plug-in calls; see platform/hx/hx_exports.h. Each reads under the
+// block's lock and keeps nothing of it.
+
+using kelp::effect::StabilizerSharedData;
+
+namespace {
+
+// Calls read(contents) under the lock; `otherwise` without a block.
+template <class Result, class Read>
+Result ReadBlock(const void* block, Result otherwise, const Read& read) {
+  if (!block) return otherwise;
+  const auto& shared = *static_cast<const StabilizerSharedData*>(block);
+  const std::shared_lock<std::shared_mutex> lock(shared.lock);
+  return read(shared.contents);
+}
+
+using Contents = StabilizerSharedData::Contents;
+
+}  // namespace
+
+extern "C" {
+
+std::uint8_t allowCUDARendering(const void* block) {
+  return ReadBlock(block, std::uint8_t{0},
+                   [](const Contents& shared) { return std::uint8_t{shared.gpu_allowed}; });
+}
+
+// The warps of a warper are never written, and a new one takes its place only where nobody renders
+// from the old one's: that is what makes the address good once the lock is gone.
+const void* getOVVarVector(const void* block, std::int32_t frame) {
+  return ReadBlock(block, static_cast<const void*>(nullptr),
+                   [frame](const Contents& shared) -> const void* {
+                     if (!shared.warper) return nullptr;
+                     return shared.warper->frameWarp(static_cast<std::size_t>(frame)).get();
+                   });
+}
+
+void getCropWindow(const void* block, std::int32_t frame, float* left, float* top, float* right,
+                   float* bottom) {
+  ReadBlock(block, false, [&](const Contents& shared) {
+    if (!shared.crop) return false;
+    const crop_rect& rect = shared.crop->rects[static_cast<std::size_t>(frame)];
+    *left = rect.left;
+    *top = rect.top;
+    *right = rect.right;
+    *bottom = rect.bottom;
+    return true;
+  });
+}
+
+std::uint8_t getStabilizerData(const void* block, std::int32_t* frame_count,
+                               std::int32_t* first_frame, std::int32_t* grid_columns,
+                               std::int32_t* grid_rows, std::int32_t* crop_width,
+                               std::int32_t* crop_height, float* min_x, float* min_y, float* max_x,
+                               float* max_y, std::int32_t* source_width,
+                               std::int32_t* source_height) {
+  return ReadBlock(block, std::uint8_t{0}, [&](const Contents& shared) {
+    if (!shared.warper) return std::uint8_t{0};
+    const auto& bounds = shared.warper->unionBounds();
+    *frame_count = static_cast<std::int32_t>(shared.warper->frameWarpCount());
+    *first_frame = shared.first_frame;
+    *grid_columns = shared.warper->gridCols();
+    *grid_rows = shared.warper->gridRows();
+    if (shared.crop) {
+      *crop_width = shared.crop->cropWidth;
+      *crop_height = shared.crop->cropHeight;
+    }
+    *min_x = static_cast<float>(bounds.min_x);
+    *min_y = static_cast<float>(bounds.min_y);
+    *max_x = static_cast<float>(bounds.max_x);
+    *max_y = static_cast<float>(bounds.max_y);
+    *source_width = shared.source_width;
+    *source_height = shared.source_height;
+    return std::uint8_t{1};
+  });
+}
+
+}  // extern "C"

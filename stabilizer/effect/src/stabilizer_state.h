@@ -1,0 +1,99 @@
+#pragma once
+
+#include <boost/function.hpp>
+#include <boost/shared_ptr.hpp>
+#include <cstdint>
+#include <optional>
+
+#include "analysis/src/analysis_state.h"
+#include "analysis/src/state_errors.h"
+#include "analysis/src/validity.h"
+#include "effect/parameter_reader.h"
+#include "platform/hx/hx_effect.h"
+#include "stabilizer/effect/src/parameter_rules.h"
+#include "stabilizer/effect/src/shared_data.h"
+#include "stabilizer/effect/src/solve_phase.h"
+#include "stabilizer/effect/src/solver.h"
+#include "stabilizer/render/frame_renderer.h"
+
+namespace kelp::effect {
+
+// What an instance of the stabilizer keeps: its analysis, the solve made from it, and the solve at
+// work. A user interface instance's belongs to that thread; a render's copy, which keeps jobs, to
+// the thread that renders. A state that is dropped cancels its Solver.
+//
+// needs_solve stands from the end of an analysis, or from a difference between what is stored and
+// what is asked for, until a Solver has ended and its results were taken.
+class StabilizerState final : public analysis::AnalysisState {
+ public:
+  // The source's size is the host-in's.
+  StabilizerState(const HX_InData& in, bool keeps_jobs);
+  ~StabilizerState() override;
+
+  // A Solver is at work.
+  bool IsWorkingOnResults() const override;
+
+  bool has_frames() const { return all_features.frame_count > 0; }
+  // Of the analysed source. No frames a second without a job input.
+  ClipGeometry Geometry() const;
+
+  // That of the Solver, else how the last one ended; none if none has.
+  std::optional<Solver::State> SolveStatus() const;
+  // What frames show until the solve is done.
+  analysis::FrameStatus SolveProgressStatus() const;
+
+  // Starts a Solver on the stored analysis, unless one is at work on just that or waits for its
+  // thread; whether it did. One at work on other inputs is dropped. Where the stored warps fit,
+  // only the frame map and the crop are made anew. make_notify gives what the Solver calls at its
+  // end; what it throws leaves everything as it was.
+  bool StartSolve(const marrow::stabilization::SolverParamsRecord& parameters,
+                  std::uint32_t frame_map_radius,
+                  const boost::function<boost::function<void()>()>& make_notify);
+  // Takes the results of the Solver, which has finished or failed, and what they were made from;
+  // the Solver goes. A failed one leaves no results.
+  void TakeSolve();
+
+  // Frames on either side that the frame map reaches.
+  std::uint32_t FrameMapRadius() const;
+
+  // The scale at which the picture is shown, with its output rectangle in the renderer: with
+  // auto_scale what the crop window calls for, with use_additional_scale the user's factor too.
+  // There must be a warper.
+  double GetZoom(const ParameterReader& params, Renderer& renderer, bool auto_scale,
+                 bool use_additional_scale) const;
+  // The crop window, as shown, is under two fifths of the frame.
+  bool IsOverCropped(const ParameterReader& params) const;
+
+  // Both ways between a state and what its renders share. Publish's gpu_allowed: whether an outside
+  // renderer may draw the frames. TakeOver leaves the track table and the analyzer of a user
+  // interface instance alone, so that neither a save nor a poll loses them.
+  void Publish(bool gpu_allowed) const;
+  void TakeOver();
+
+  SolvePhase phase = SolvePhase::None;
+  bool needs_solve = false;
+  bool subsequent_solve = false;  // the solve is of a changed deletion
+  boost::shared_ptr<Solver> solver;
+  // Of a solved phase; published, so never written.
+  boost::shared_ptr<const marrow::stabilization::CPWarper> warper;
+  boost::shared_ptr<const cropper> crop;
+  std::uint32_t solve_hash = 0;
+  std::uint32_t crop_hash = 0;
+  StabilizerSharedData* shared = nullptr;  // attached to; see StabilizerEffect::AttachSharedData
+  // What the host still has to be told, where telling it has failed.
+  analysis::FrameStatus unpublished = analysis::FrameStatus::None;
+  // The size of the source about which the user was told last that the state is of another.
+  analysis::SourceSize reported_size;
+
+ private:
+  bool IsAtWorkOn(const Solver::Inputs& inputs) const;
+  bool MayReuseWarper(const Solver::Inputs& inputs) const;
+};
+
+// How the parameters ask for frames to be drawn.
+RenderSettings GetRenderSettings(const ParameterReader& params);
+
+// Synthesis Input Range in frames, halves away from zero; 0 unless the edges are synthesized.
+std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate);
+
+}  // namespace kelp::effect

@@ -1,0 +1,109 @@
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cstring>
+#include <thread>
+#include <vector>
+
+#include "host/base/operations.h"
+#include "host/effects/handle_store.h"
+#include "host/effects/opaque_store.h"
+#include "host/effects/world_store.h"
+
+namespace calmframe::host {
+namespace {
+
+class StoresTest : public testing::Test {
+ protected:
+  StoresTest() { Ledger::Get().Reset(); }
+};
+
+TEST_F(StoresTest, BlocksMoveWhenTheLastLockGoes) {
+  HandleStore handles;
+  handles.MoveOnUnlock(true);
+  const HX_Handle handle = handles.NewFrom({1, 2, 3});
+  void* first = handles.Lock(handle);
+  EXPECT_EQ(handles.Lock(handle), first);
+  handles.Unlock(handle);
+  EXPECT_EQ(std::memcmp(first, "\1\2\3", 3), 0);  // still locked once
+  handles.Unlock(handle);
+  EXPECT_EQ(handles.BytesOf(handle), (std::vector<std::uint8_t>{1, 2, 3}));
+  EXPECT_EQ(handles.Resize(handle, 5), 0);
+  EXPECT_EQ(handles.BytesOf(handle), (std::vector<std::uint8_t>{1, 2, 3, 0, 0}));
+  handles.Dispose(handle);
+  EXPECT_EQ(handles.count(), 0u);
+  EXPECT_EQ(Ledger::Get().Report(), "");
+}
+
+TEST_F(StoresTest, MisuseOfHandlesIsNotedAndHarmless) {
+  HandleStore handles;
+  const HX_Handle gone = handles.New(8);
+  handles.Dispose(gone);
+  const HX_Handle other = handles.New(8);
+  EXPECT_NE(other, gone);  // never given twice
+  EXPECT_EQ(handles.Lock(gone), nullptr);
+  handles.Unlock(other);
+  handles.Dispose(gone);
+  handles.Lock(other);
+  EXPECT_NE(handles.Resize(other, 9), 0);
+  EXPECT_EQ(handles.locks(), 1u);
+  EXPECT_EQ(Ledger::Get().mistakes(),
+            (std::vector<std::string>{"lock_handle: unknown handle", "unlock_handle: not locked",
+                                      "dispose_handle: unknown handle", "resize_handle: locked"}));
+  EXPECT_EQ(handles.New(~std::uint64_t{0}), nullptr);
+}
+
+TEST_F(StoresTest, WritingBehindARowIsFoundWhenTheWorldGoes) {
+  WorldStore worlds;
+  worlds.SetRowPadding(4);
+  HX_World world{};
+  ASSERT_EQ(worlds.New(3, 2, true, HX_FORMAT_BGRA8, &world), 0);
+  EXPECT_EQ(world.row_bytes, 16);
+  static_cast<std::uint8_t*>(world.data)[12] = 0;
+  HX_World copy = world;
+  EXPECT_EQ(worlds.Dispose(&world), 0);
+  EXPECT_EQ(world.data, nullptr);
+  EXPECT_NE(worlds.Dispose(&copy), 0);
+  EXPECT_EQ(Ledger::Get().mistakes().size(), 2u);
+  EXPECT_EQ(worlds.New(1, 1, true, 0x12345678, &world), HX_ERR_UNKNOWN);
+  EXPECT_EQ(worlds.New(1 << 30, 1 << 30, true, HX_FORMAT_ARGB8, &world), HX_ERR_MEMORY);
+  EXPECT_EQ(worlds.count(), 0u);
+}
+
+// Two threads attach to one reference and let go, again and again; a block is deleted by whoever is
+// told that it was the last.
+TEST_F(StoresTest, OpaqueDataStandsOnceWhoeverComesFirst) {
+  OpaqueStore store;
+  std::atomic<int> blocks{0};
+  const auto work = [&] {
+    for (int i = 0; i < 3000; ++i) {
+      void* block = store.Find(7);
+      if (!block) {
+        int* own = new int(41);
+        ++blocks;
+        block = store.Set(7, own);
+        if (block != own) {
+          delete own;
+          --blocks;
+        }
+      }
+      EXPECT_EQ(*static_cast<const int*>(block), 41);
+      if (store.Release(7)) {
+        delete static_cast<int*>(block);
+        --blocks;
+      }
+    }
+  };
+  std::thread first(work), second(work);
+  first.join();
+  second.join();
+  EXPECT_EQ(blocks, 0);
+  EXPECT_EQ(store.uses(), 0u);
+  EXPECT_EQ(store.Peek(7), nullptr);
+  EXPECT_EQ(Ledger::Get().Report(), "");
+  EXPECT_FALSE(store.Release(7));
+  EXPECT_EQ(Ledger::Get().mistakes().size(), 1u);
+}
+
+}  // namespace
+}  // namespace calmframe::host

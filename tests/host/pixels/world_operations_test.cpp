@@ -1,0 +1,230 @@
+#include "host/pixels/world_operations.h"
+
+#include <gtest/gtest.h>
+
+#include <array>
+#include <cmath>
+#include <cstdint>
+#include <random>
+#include <vector>
+
+#include "host/pixels/world_buffer.h"
+
+namespace calmframe::host {
+namespace {
+
+constexpr std::array<std::uint32_t, 4> kFormats = {HX_FORMAT_ARGB8, HX_FORMAT_BGRA8,
+                                                   HX_FORMAT_ARGB16, HX_FORMAT_ARGBF};
+
+using Colour = std::array<double, 4>;  // alpha, red, green, blue
+
+double Full(std::uint32_t format) {
+  return format == HX_FORMAT_ARGB16 ? 32768.0 : format == HX_FORMAT_ARGBF ? 1.0 : 255.0;
+}
+
+// Plain access, a pixel at a time.
+Colour Get(const WorldBuffer& buffer, int x, int y) {
+  const std::uint32_t format = buffer.world().format;
+  Colour colour{};
+  for (int c = 0; c < 4; ++c) {
+    const int at = x * 4 + (format == HX_FORMAT_BGRA8 ? 3 - c : c);
+    const double value = format == HX_FORMAT_ARGBF    ? double{buffer.row<float>(y)[at]}
+                         : format == HX_FORMAT_ARGB16 ? buffer.row<std::uint16_t>(y)[at]
+                                                      : buffer.row<std::uint8_t>(y)[at];
+    colour[c] = value / Full(format);
+  }
+  return colour;
+}
+
+void Put(WorldBuffer& buffer, int x, int y, const Colour& colour) {
+  const std::uint32_t format = buffer.world().format;
+  for (int c = 0; c < 4; ++c) {
+    const int at = x * 4 + (format == HX_FORMAT_BGRA8 ? 3 - c : c);
+    const double value = colour[c] * Full(format);
+    if (format == HX_FORMAT_ARGBF) {
+      buffer.row<float>(y)[at] = static_cast<float>(value);
+    } else if (format == HX_FORMAT_ARGB16) {
+      buffer.row<std::uint16_t>(y)[at] = static_cast<std::uint16_t>(std::lround(value));
+    } else {
+      buffer.row<std::uint8_t>(y)[at] = static_cast<std::uint8_t>(std::lround(value));
+    }
+  }
+}
+
+// Alphas of 0 and 1 among others.
+void Fill(WorldBuffer& buffer, unsigned seed) {
+  std::mt19937 random(seed);
+  std::uniform_real_distribution<double> value(0, 1);
+  for (int y = 0; y < buffer.world().height; ++y) {
+    for (int x = 0; x < buffer.world().width; ++x) {
+      const double alpha = std::clamp(value(random) * 2 - 0.5, 0.0, 1.0);
+      Put(buffer, x, y, {alpha, value(random), value(random), value(random)});
+    }
+  }
+}
+
+Colour InFront(const Colour& s, const Colour& d) {
+  const double a = s[0] + d[0] * (1 - s[0]);
+  if (a == 0) return {};
+  Colour result{a};
+  for (int c = 1; c < 4; ++c) result[c] = (s[c] * s[0] + d[c] * d[0] * (1 - s[0])) / a;
+  return result;
+}
+
+TEST(Transfer, ComposesAllFormatsClippedAsTheFormulaTells) {
+  for (const std::uint32_t from_format : kFormats) {
+    for (const std::uint32_t to_format : kFormats) {
+      for (const int mode : {HX_TRANSFER_BEHIND, HX_TRANSFER_IN_FRONT}) {
+        WorldBuffer from(7, 6, from_format, 12), to(9, 5, to_format, 8), before(9, 5, to_format);
+        Fill(from, 1);
+        Fill(to, 2);
+        Fill(before, 2);
+        // Half opaque in front, told in the word that the target's depth reads.
+        const bool half = mode == HX_TRANSFER_IN_FRONT;
+        const double opacity = half ? 0.5 : 1.0;
+        const HX_TransferMode record = {mode, 0, static_cast<std::uint8_t>(half ? 0 : 255), 0,
+                                        static_cast<std::uint16_t>(half ? 16384 : 32768)};
+        const bool deep = to_format == HX_FORMAT_ARGB16 || to_format == HX_FORMAT_ARGBF;
+        HX_TransferMode used = record;
+        if (half && !deep) used.opacity = 51, used.opacity_u16 = 1;  // a fifth
+        const double factor = half && !deep ? 0.2 : opacity;
+        ASSERT_EQ(Transfer(from.world(), used, -2, 1, to.world()), 0);
+        const double step = deep ? 1e-4 : 0.5 / 255 + 1e-6;
+        for (int y = 0; y < 5; ++y) {
+          for (int x = 0; x < 9; ++x) {
+            Colour expected = Get(before, x, y);
+            const bool inside = x < 5 && y >= 1;
+            if (inside) {
+              Colour s = Get(from, x + 2, y - 1);
+              s[0] *= factor;
+              expected = half ? InFront(s, expected) : InFront(expected, s);
+            }
+            const Colour found = Get(to, x, y);
+            for (int c = 0; c < 4; ++c) {
+              ASSERT_NEAR(found[c], expected[c], inside ? step : 0)
+                  << mode << " " << x << " " << y << " " << c;
+            }
+          }
+        }
+        EXPECT_TRUE(to.PaddingIntact());
+      }
+    }
+  }
+  WorldBuffer world(1, 1, HX_FORMAT_ARGB8);
+  EXPECT_NE(Transfer(world.world(), {3, 0, 255, 0, 32768}, 0, 0, world.world()), 0);
+}
+
+TEST(CopyWorld, MovesAndClipsWithoutChange) {
+  WorldBuffer from(6, 4, HX_FORMAT_ARGB16, 4), to(5, 5, HX_FORMAT_ARGB16, 4);
+  Fill(from, 3);
+  const HX_Rect source = {1, 0, 6, 4}, target = {-1, 2, 4, 6};
+  ASSERT_EQ(CopyWorld(from.world(), to.world(), &source, &target), 0);
+  for (int y = 0; y < 5; ++y) {
+    for (int x = 0; x < 5; ++x) {
+      const bool inside = x < 4 && y >= 2;
+      EXPECT_EQ(Get(to, x, y), inside ? Get(from, x + 2, y - 2) : Colour{}) << x << " " << y;
+    }
+  }
+  EXPECT_TRUE(to.PaddingIntact());
+  const HX_Rect far = {100, 100, 106, 104};
+  EXPECT_EQ(CopyWorld(from.world(), to.world(), nullptr, &far), 0);
+  HX_World nothing{};
+  EXPECT_NE(CopyWorld(nothing, to.world(), nullptr, nullptr), 0);
+}
+
+TEST(CopyWorld, ConvertsThereAndBackWithoutLoss) {
+  WorldBuffer bytes(256, 1, HX_FORMAT_ARGB8), back(256, 1, HX_FORMAT_ARGB8);
+  for (int i = 0; i < 256; ++i) Put(bytes, i, 0, {i / 255.0, 1 - i / 255.0, 0, 1});
+  for (const std::uint32_t format : kFormats) {
+    WorldBuffer other(256, 1, format);
+    CopyWorld(bytes.world(), other.world(), nullptr, nullptr);
+    EXPECT_NEAR(Get(other, 128, 0)[0], 128 / 255.0, 0.5 / Full(format) + 1e-7);
+    CopyWorld(other.world(), back.world(), nullptr, nullptr);
+    for (int i = 0; i < 256; ++i) ASSERT_EQ(Get(back, i, 0), Get(bytes, i, 0)) << format;
+  }
+  WorldBuffer wild(3, 1, HX_FORMAT_ARGBF);
+  wild.row<float>(0)[0] = 7.5f;
+  wild.row<float>(0)[4] = -1.0f;
+  wild.row<float>(0)[8] = NAN;
+  CopyWorld(wild.world(), back.world(), nullptr, nullptr);  // scales; now at one size
+  WorldBuffer clamped(3, 1, HX_FORMAT_ARGB16);
+  CopyWorld(wild.world(), clamped.world(), nullptr, nullptr);
+  EXPECT_EQ(clamped.row<HX_Pixel16>(0)[0].alpha, 32768);
+  EXPECT_EQ(clamped.row<HX_Pixel16>(0)[1].alpha, 0);
+  EXPECT_EQ(clamped.row<HX_Pixel16>(0)[2].alpha, 0);
+}
+
+TEST(CopyWorld, ShrinksByAreaWithColoursWeightedByAlpha) {
+  WorldBuffer from(3, 2, HX_FORMAT_ARGBF), to(2, 1, HX_FORMAT_ARGBF);
+  Put(from, 0, 0, {1, 0.2, 0, 0});
+  Put(from, 1, 0, {1, 0.8, 0, 0});
+  Put(from, 2, 0, {0, 1, 0, 0});
+  Put(from, 0, 1, {1, 0.2, 0, 0});
+  Put(from, 1, 1, {1, 0.8, 0, 0});
+  Put(from, 2, 1, {1, 0.5, 0, 0});
+  ASSERT_EQ(CopyWorld(from.world(), to.world(), nullptr, nullptr), 0);
+  // Each target pixel covers 1.5 columns: two thirds of one, a third of the middle one.
+  EXPECT_NEAR(Get(to, 0, 0)[1], (0.2 * 2 + 0.8) / 3, 1e-6);
+  EXPECT_NEAR(Get(to, 0, 0)[0], 1, 1e-6);
+  // Right: alpha (2/3 * 1/2 + 1/3), red of what is opaque.
+  EXPECT_NEAR(Get(to, 1, 0)[0], 2.0 / 3, 1e-6);
+  EXPECT_NEAR(Get(to, 1, 0)[1], (0.8 / 3 + 0.5 / 3) / (2.0 / 3), 1e-6);
+}
+
+TEST(CopyWorld, GrowsLinearlyBetweenPixelCentres) {
+  WorldBuffer from(2, 1, HX_FORMAT_ARGBF), to(4, 1, HX_FORMAT_ARGBF);
+  Put(from, 0, 0, {1, 0, 0, 0});
+  Put(from, 1, 0, {1, 1, 0, 0});
+  CopyWorld(from.world(), to.world(), nullptr, nullptr);
+  const double expected[] = {0, 0.25, 0.75, 1};
+  for (int x = 0; x < 4; ++x) EXPECT_NEAR(Get(to, x, 0)[1], expected[x], 1e-6);
+}
+
+TEST(Blur, IsAGaussianOfHalfTheRadiusWithEdgesRepeated) {
+  for (const std::uint32_t format : kFormats) {
+    WorldBuffer from(21, 15, format), to(21, 15, format, 4);
+    for (int y = 0; y < 15; ++y) {
+      for (int x = 0; x < 21; ++x) Put(from, x, y, {1, x == 10 && y == 7 ? 1.0 : 0.0, 0.4, 0});
+    }
+    ASSERT_EQ(Blur(from.world(), to.world(), 3.0f), 0);
+    double sum = 0;
+    for (int y = 0; y < 15; ++y) {
+      for (int x = 0; x < 21; ++x) {
+        const Colour found = Get(to, x, y);
+        sum += found[1];
+        EXPECT_NEAR(found[0], 1, 1e-3);
+        EXPECT_NEAR(found[2], 0.4, 3e-3);
+        // Sampled at the pixels, sigma 1.5: the sum of the samples is 1.5 sqrt(2 pi) to 1e-9.
+        const double d2 = (x - 10) * (x - 10) + (y - 7) * (y - 7);
+        const double weight = std::exp(-d2 / 4.5) / (4.5 * M_PI);
+        EXPECT_NEAR(found[1], weight, format == HX_FORMAT_ARGBF ? 5e-4 : 3e-3);
+      }
+    }
+    if (format == HX_FORMAT_ARGBF) {
+      EXPECT_NEAR(sum, 1, 1e-4);
+    }
+    ASSERT_EQ(Blur(from.world(), to.world(), 0.0f), 0);
+    EXPECT_EQ(Get(to, 10, 7), Get(from, 10, 7));
+  }
+}
+
+TEST(ColourOfHls, LightnessIsTheBrightestComponent) {
+  const auto colour = [](double hue, double lightness, double saturation) {
+    const std::int32_t hls[3] = {static_cast<std::int32_t>(hue * 65536),
+                                 static_cast<std::int32_t>(lightness * 65536),
+                                 static_cast<std::int32_t>(saturation * 65536)};
+    const HX_Pixel8 rgb = ColourOfHls(hls);
+    return std::array<int, 4>{rgb.alpha, rgb.red, rgb.green, rgb.blue};
+  };
+  using Rgb = std::array<int, 4>;
+  EXPECT_EQ(colour(0, 1, 1), (Rgb{255, 255, 0, 0}));
+  EXPECT_EQ(colour(1.0 / 4, 1, 1), (Rgb{255, 128, 255, 0}));
+  EXPECT_EQ(colour(0.5, 1, 1), (Rgb{255, 0, 255, 255}));
+  EXPECT_EQ(colour(0.75, 1, 1), (Rgb{255, 128, 0, 255}));
+  EXPECT_EQ(colour(1, 1, 1), (Rgb{255, 255, 0, 0}));
+  EXPECT_EQ(colour(0.5, 0.5, 0.5), (Rgb{255, 64, 128, 128}));
+  EXPECT_EQ(colour(0.3, 1, 0), (Rgb{255, 255, 255, 255}));
+}
+
+}  // namespace
+}  // namespace calmframe::host

@@ -1,0 +1,115 @@
+#include "host/plugin/property_record.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <string_view>
+
+#include "host/plugin/plugin_library.h"
+
+namespace calmframe::host {
+namespace {
+
+using namespace std::string_literals;
+
+std::string Little(std::uint32_t value, int bytes) {
+  std::string text;
+  for (int i = 0; i < bytes; ++i) text += static_cast<char>(value >> 8 * i);
+  return text;
+}
+
+std::string Header(std::uint32_t count) {
+  return Little(1, 2) + Little(0, 4) + Little(count, 4);
+}
+
+std::string Property(std::string_view key, const std::string& value, bool padded = true) {
+  std::string stored = value;
+  stored.resize((value.size() + 3) / 4 * 4);
+  return "XVN8" + std::string(key) + Little(0, 4) +
+         Little(static_cast<std::uint32_t>(padded ? stored.size() : value.size()), 4) + stored;
+}
+
+std::string Whole(bool padded) {
+  return Header(5) + Property("dnik", "TKFx") + Property("eman", "\x05$$$/A"s, padded) +
+         Property("?new", "unknown to this reader", padded) + Property("4668", "Main\0"s, padded) +
+         Property("ANMx",
+                  "\x06"
+                  "Effect"s,
+                  padded);
+}
+
+PluginProperties Read(const std::string& record) {
+  return ReadPropertyRecord(record.data(), record.size());
+}
+
+std::string Refusal(const std::string& record) {
+  try {
+    Read(record);
+  } catch (const PluginError& error) {
+    return error.what();
+  }
+  return "none";
+}
+
+TEST(PropertyRecordReader, TakesPaddedAndUnpaddedLengthsAndSkipsUnknownKeys) {
+  for (const bool padded : {true, false}) {
+    const PluginProperties properties = Read(Whole(padded));
+    EXPECT_EQ(properties.name, "$$$/A");
+    EXPECT_EQ(properties.entry, "Main");
+    EXPECT_EQ(properties.match_name, "Effect");
+    EXPECT_EQ(properties.host_flags, 0u);
+  }
+  const PluginProperties words = Read(
+      Header(5) + Property("dnik", "TKFx") + Property("4668", "E\0"s) + Property("ANMx", "\1m") +
+      Property("FNIx", "\x34\x12", false) + Property("2LGx", "\x48\x94\x02\0"s));
+  EXPECT_EQ(words.effect_info, 0x1234u);
+  EXPECT_EQ(words.out_flags_2, 0x00029448u);
+}
+
+TEST(PropertyRecordReader, RefusesWhatIsCutAnywhere) {
+  const std::string record = Whole(false);
+  for (std::size_t size = 0; size + 1 < record.size(); ++size) {  // one byte of padding may be gone
+    EXPECT_NE(Refusal(record.substr(0, size)), "none") << size;
+  }
+  EXPECT_EQ(Refusal(record.substr(0, record.size() - 1)), "none");
+}
+
+TEST(PropertyRecordReader, RefusesDamageWithItsCause) {
+  const auto damaged = [](std::size_t at, const std::string& bytes) {
+    return Whole(true).replace(at, bytes.size(), bytes);
+  };
+  EXPECT_EQ(Refusal(damaged(0, "\2")), "property record of another version");
+  EXPECT_EQ(Refusal(damaged(2, "\1")), "property record of another version");
+  EXPECT_EQ(Refusal(damaged(6, "\x7")), "property record ends within a property");
+  EXPECT_EQ(Refusal(damaged(10, "XVN7")), "property of another vendor");
+  EXPECT_EQ(Refusal(damaged(26, "TKFy")), "plug-in of another kind");
+  EXPECT_EQ(Refusal(damaged(22, "\xff\xff\xff\xff")), "property record ends within a property");
+  EXPECT_EQ(Refusal(damaged(46, "\x08")), "property \"eman\" is too short");
+  EXPECT_EQ(Refusal(Header(1) + Property("dnik", "TKFx")), "property record without an entry");
+  EXPECT_EQ(Refusal(Header(1) + Property("4668", "Main")), "property \"4668\" has no end");
+  EXPECT_EQ(Refusal(Header(0)), "property record without a kind");
+}
+
+TEST(PluginLibraryTest, RefusalsNameTheFile) {
+  const auto refusal = [](const std::string& path) {
+    try {
+      PluginLibrary library(path);
+    } catch (const PluginError& error) {
+      return std::string(error.what());
+    }
+    return "none"s;
+  };
+  EXPECT_NE(refusal("/nowhere/plugin.so").find("/nowhere/plugin.so: "), std::string::npos);
+  EXPECT_EQ(refusal(OTHER_LIBRARY), OTHER_LIBRARY ": not a plug-in, it has no property record");
+}
+
+TEST(PluginLibraryTest, FindsEntryAndExports) {
+  const PluginLibrary library(PROBE_PLUGIN);
+  EXPECT_EQ(library.properties().match_name, "Probe");
+  EXPECT_EQ(library.properties().entry, "ProbeMain");
+  EXPECT_EQ(library.entry()(19, nullptr, nullptr, nullptr, nullptr, nullptr), 0);
+  EXPECT_EQ(library.exports().allow_cuda_rendering, nullptr);
+}
+
+}  // namespace
+}  // namespace calmframe::host

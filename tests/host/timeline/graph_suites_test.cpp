@@ -1,0 +1,194 @@
+#include <gmock/gmock.h>
+
+#include <cstring>
+
+#include "tests/host/timeline/timeline_fixture.h"
+
+namespace calmframe::host {
+namespace {
+
+using tessel::utility::Guid;
+
+constexpr std::int64_t kFrame = 28224000;  // ticks at 25 frames a second
+
+class GraphSuitesTest : public TimelineTest {
+ protected:
+  // The node that stands at a time, or 0.
+  HX_Node NodeAt(std::int64_t ticks) {
+    HX_Segments segments = 0;
+    HX_Node node = 0;
+    EXPECT_EQ(sequence.AcquireSegments(effect, &segments), HX_ERR_NONE);
+    graph.GetSegmentNodeAt(segments, ticks, &node);
+    EXPECT_EQ(sequence.ReleaseSegments(segments), HX_ERR_NONE);
+    return node;
+  }
+  std::int64_t Property(HX_Node node, const char* key) {
+    HX_String text = nullptr;
+    if (graph.GetProperty(node, key, &text) != HX_ERR_NONE) return -1;
+    return std::stoll(Take(text));
+  }
+  std::string GuidOf(HX_Node node) {
+    HX_Guid guid{};
+    EXPECT_EQ(graph.GetNodeGuid(node, &guid), HX_ERR_NONE);
+    Guid::Bytes bytes;
+    std::memcpy(bytes.data(), guid.bytes, sizeof guid.bytes);
+    return Guid(bytes).ToText();
+  }
+  // From the output inwards: each node's Guid, and its operator's id and text.
+  struct Chain {
+    std::vector<std::string> guids, texts;
+    std::vector<std::int64_t> ids;
+  };
+  Chain Walk() {
+    Chain chain;
+    HX_Node node = NodeAt(0);
+    while (node != 0) {
+      chain.guids.push_back(GuidOf(node));
+      EXPECT_EQ(Property(node, HX_PROPERTY_STREAM_WIDTH), 6) << "passed down by every node";
+      std::int32_t operators = -1, inputs = -1;
+      EXPECT_EQ(graph.GetOperatorCount(node, &operators), HX_ERR_NONE);
+      EXPECT_EQ(graph.GetInputCount(node, &inputs), HX_ERR_NONE);
+      EXPECT_EQ(operators, inputs) << "an effect a node, and none on the media";
+      HX_Node effect_operator = 0, input = 0;
+      if (operators == 1) {
+        EXPECT_EQ(graph.GetOperator(node, 0, &effect_operator), HX_ERR_NONE);
+        EXPECT_EQ(graph.GetInput(node, 0, &input), HX_ERR_NONE);
+        HX_String text = nullptr;
+        EXPECT_EQ(graph.GetOperatorText(effect_operator, &text), HX_ERR_NONE);
+        chain.texts.push_back(Take(text));
+        chain.ids.push_back(Property(effect_operator, HX_PROPERTY_RUNTIME_INSTANCE_ID));
+        EXPECT_EQ(graph.ReleaseNode(effect_operator), HX_ERR_NONE);
+      }
+      EXPECT_NE(graph.GetInput(node, inputs, &effect_operator), HX_ERR_NONE);
+      EXPECT_EQ(graph.ReleaseNode(node), HX_ERR_NONE);
+      node = input;
+    }
+    return chain;
+  }
+};
+
+TEST_F(GraphSuitesTest, EffectsStandAboveTheMediaInTheirOrder) {
+  layer->InsertEffect(0, {50, "Upstream", "a=1", {}});
+  layer->InsertEffect(2, {60, "Downstream", "", {}});
+  const Chain chain = Walk();
+  EXPECT_THAT(chain.ids, testing::ElementsAre(60, kOwnId, 50));
+  ASSERT_EQ(chain.guids.size(), 4u);
+  EXPECT_EQ(chain.guids[3], Guid::FromText("drawn frames").ToText());
+
+  // In another process ids and names differ, the identities don't.
+  layer->Change([](LayerState& state) {
+    state.name = "renamed";
+    for (EffectOperator& one : state.effects) one.runtime_id += 1000;
+  });
+  const Chain again = Walk();
+  EXPECT_EQ(again.guids, chain.guids);
+  EXPECT_EQ(again.texts, chain.texts);
+  for (const std::string& text : chain.texts) {
+    Guid guid;
+    EXPECT_TRUE(Guid::Parse(text, &guid));
+  }
+}
+
+// Stored by projects: they may never change.
+TEST_F(GraphSuitesTest, IdentitiesStayWhatTheyWere) {
+  const Chain chain = Walk();
+  EXPECT_THAT(chain.guids, testing::ElementsAre("e5c96a89-a797-6c3e-32c9-a1b7786fd426",
+                                                "8ba10cfc-4f53-1d12-d9a8-7116fc5c5072"));
+}
+
+TEST_F(GraphSuitesTest, AChangeShowsInAllThatStandsAboveIt) {
+  layer->InsertEffect(0, {50, "Upstream", "a=1", {}});
+  layer->InsertEffect(2, {60, "Downstream", "", {}});
+  const Chain before = Walk();
+  layer->SetParameters(60, "b=1");
+  const Chain downstream = Walk();
+  EXPECT_NE(downstream.guids[0], before.guids[0]);
+  EXPECT_NE(downstream.texts[0], before.texts[0]);
+  for (int i = 1; i < 4; ++i) EXPECT_EQ(downstream.guids[i], before.guids[i]);
+  layer->SetParameters(50, "a=2");
+  const Chain upstream = Walk();
+  for (int i = 0; i < 3; ++i) EXPECT_NE(upstream.guids[i], downstream.guids[i]);
+  EXPECT_EQ(upstream.guids[3], before.guids[3]);
+}
+
+TEST_F(GraphSuitesTest, ALayerStandsFromItsInPointForItsLength) {
+  layer->Change([](LayerState& state) {
+    state.start_frame = -2;
+    state.length = 5;
+  });
+  const auto stands = [&](std::int64_t ticks) {
+    const HX_Node node = NodeAt(ticks);
+    if (node != 0) graph.ReleaseNode(node);
+    return node != 0;
+  };
+  EXPECT_FALSE(stands(-2 * kFrame - 1));
+  EXPECT_TRUE(stands(-2 * kFrame));
+  EXPECT_TRUE(stands(3 * kFrame - 1));
+  EXPECT_FALSE(stands(3 * kFrame));
+  layer->Change([](LayerState& state) { state.length = 0; });
+  EXPECT_FALSE(stands(-2 * kFrame));
+  services.faults.node_missing = true;
+  layer->Change([](LayerState& state) { state.length = 5; });
+  EXPECT_FALSE(stands(0));
+  std::int64_t ticks = 0;
+  EXPECT_EQ(sequence.GetTicksPerFrame(effect, &ticks), HX_ERR_NONE);
+  EXPECT_EQ(ticks, kFrame);
+}
+
+TEST_F(GraphSuitesTest, PropertiesAreThoseOfTheMediaAsItIsShown) {
+  const HX_Node node = InputNode();
+  EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), 6);
+  EXPECT_EQ(Property(node, "MediaNode::StreamFrameHeight"), 4);
+  EXPECT_EQ(Property(node, "MediaNode::StreamPixelAspectRatioNum"), 16);
+  EXPECT_EQ(Property(node, "MediaNode::StreamPixelAspectRatioDen"), 15);
+  EXPECT_EQ(Property(node, "MediaNode::Unknown"), -1);
+  EXPECT_EQ(Property(node, "EffectNode::RuntimeInstanceID"), -1);
+  const std::string guid = GuidOf(node);
+  layer->Resize(1, 1);
+  EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), 6) << "a reference shows what it was";
+  services.faults.property_missing = true;
+  EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), -1);
+  services.faults.property_missing = false;
+  graph.ReleaseNode(node);
+  const HX_Node resized = InputNode();
+  EXPECT_EQ(Property(resized, "MediaNode::StreamFrameWidth"), 1);
+  EXPECT_NE(GuidOf(resized), guid);
+  graph.ReleaseNode(resized);
+}
+
+TEST_F(GraphSuitesTest, ADetachedEffectIsRefusedAndItsNodesGoOn) {
+  const HX_Node node = InputNode();
+  services.DetachEffect(effect);
+  services.DetachEffect(effect);
+  HX_Segments segments = 0;
+  EXPECT_NE(sequence.AcquireSegments(effect, &segments), HX_ERR_NONE);
+  layer.reset();
+  EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), 6);
+  EXPECT_EQ(graph.ReleaseNode(node), HX_ERR_NONE);
+  EXPECT_NE(graph.ReleaseNode(node), HX_ERR_NONE);
+  EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), -1);
+  EXPECT_NE(graph.GetInput(node, 0, nullptr), HX_ERR_NONE);
+  mistakes = "Video Segment.ReleaseNode of what is not lent\n";
+}
+
+TEST_F(GraphSuitesTest, OperationsFailOnOrderAndGiveBackAllTheSame) {
+  Operations::Get().FailAlways("Video Segment.ReleaseNode");
+  const HX_Node node = NodeAt(0);
+  EXPECT_EQ(graph.ReleaseNode(node), kFaultCode);
+  EXPECT_EQ(services.counts().nodes, 0u);
+  Operations::Get().FailAlways("Sequence Info.AcquireSegments");
+  HX_Segments segments = 0;
+  EXPECT_EQ(sequence.AcquireSegments(effect, &segments), kFaultCode);
+  Operations::Get().FailNone();
+}
+
+TEST_F(GraphSuitesTest, SuitesAreFoundByNameAndVersion) {
+  EXPECT_EQ(services.FindSuite("Rushbase Sequence Info Suite", 3), &sequence);
+  EXPECT_EQ(services.FindSuite("Rushbase Sequence Info Suite", 4), nullptr);
+  EXPECT_EQ(services.FindSuite("HX Utility Suite", 3), nullptr);
+  EXPECT_THROW(MediaServices{}, std::logic_error);
+  EXPECT_EQ(MediaServices::active(), &services);
+}
+
+}  // namespace
+}  // namespace calmframe::host

@@ -1,0 +1,102 @@
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <boost/make_shared.hpp>
+#include <string>
+#include <vector>
+
+#include "host/base/operations.h"
+#include "host/timeline/media_services.h"
+
+namespace calmframe::host {
+
+// Drawn media: pixel (x, y) of frame f is 8 bits of red x + 10 y, green f, blue 7, opaque.
+inline SourceInfo DrawnInfo(int width, int height, std::int64_t frames) {
+  SourceInfo info;
+  info.width = width;
+  info.height = height;
+  info.frame_count = frames;
+  info.pixel_aspect = {16, 15};
+  info.content = tessel::utility::Guid::FromText("drawn frames");
+  return info;
+}
+inline void DrawFrame(std::int64_t frame, Picture& picture) {
+  FillPicture(picture, [&](int x, int y) {
+    return HX_PixelFloat{1, static_cast<float>(x + 10 * y) / 255, static_cast<float>(frame) / 255,
+                         7.0f / 255};
+  });
+}
+
+// A plug-in's view of the services: an effect on a layer of drawn media of 6 by 4 pixels, and the
+// tables. At the end nothing that was lent may be missing.
+class TimelineTest : public testing::Test {
+ protected:
+  TimelineTest()
+      : layer(boost::make_shared<Layer>(MakeDrawnSource(DrawnInfo(6, 4, 20), DrawFrame))) {
+    Ledger::Get().Reset();
+    layer->InsertEffect(0, {kOwnId, "Own", "", {}});
+    services.AttachEffect(effect, layer, kOwnId);
+  }
+  ~TimelineTest() override {
+    services.Shutdown();
+    const MediaCounts counts = services.counts();
+    EXPECT_EQ(counts.nodes, 0u);
+    EXPECT_EQ(counts.segments, 0u);
+    EXPECT_EQ(counts.strings, 0u);
+    EXPECT_EQ(counts.frames, 0u);
+    EXPECT_EQ(counts.references, 0u);
+    EXPECT_EQ(counts.requests, 0u);
+    EXPECT_EQ(Ledger::Get().Report(), mistakes);
+  }
+
+  template <class Table>
+  const Table& Suite(const char* name, std::int32_t version) {
+    const void* const table = services.FindSuite(name, version);
+    if (!table) throw std::runtime_error(name);
+    return *static_cast<const Table*>(table);
+  }
+
+  std::string Take(HX_String string) {
+    const char* text = "";
+    EXPECT_EQ(strings.GetUTF8(string, &text), HX_ERR_NONE);
+    const std::string taken = text;
+    EXPECT_EQ(strings.Dispose(string), HX_ERR_NONE);
+    return taken;
+  }
+
+  // The node so many levels beneath the top one; 1 enters the effect if none is downstream.
+  HX_Node NodeBelow(int levels) {
+    HX_Segments segments = 0;
+    HX_Node node = 0;
+    EXPECT_EQ(sequence.AcquireSegments(effect, &segments), HX_ERR_NONE);
+    EXPECT_EQ(graph.GetSegmentNodeAt(segments, 0, &node), HX_ERR_NONE);
+    EXPECT_EQ(sequence.ReleaseSegments(segments), HX_ERR_NONE);
+    while (levels-- > 0) {
+      HX_Node input = 0;
+      EXPECT_EQ(graph.GetInput(node, 0, &input), HX_ERR_NONE);
+      EXPECT_EQ(graph.ReleaseNode(node), HX_ERR_NONE);
+      node = input;
+    }
+    return node;
+  }
+  HX_Node InputNode() { return NodeBelow(1); }
+
+  static constexpr std::uint32_t kOwnId = 41;
+  MediaServices services;
+  boost::shared_ptr<Layer> layer;
+  const HX_EffectRef effect = reinterpret_cast<HX_EffectRef>(this);
+  std::string mistakes;  // that the Ledger is to have at the end
+
+  const HX_SequenceInfoSuite& sequence =
+      Suite<HX_SequenceInfoSuite>("Rushbase Sequence Info Suite", 2);
+  const HX_VideoSegmentSuite5& graph =
+      Suite<HX_VideoSegmentSuite5>("Rushbase Video Segment Suite", 5);
+  const HX_VideoSegmentRenderSuite3& renders =
+      Suite<HX_VideoSegmentRenderSuite3>("Rushbase Video Segment Render Suite", 3);
+  const HX_CutPixSuite1& frames = Suite<HX_CutPixSuite1>("Cutline CutPix Suite", 1);
+  const HX_CutPixCacheSuite5& cache = Suite<HX_CutPixCacheSuite5>("Cutline CutPix Cache Suite", 5);
+  const HX_StringSuite1& strings = Suite<HX_StringSuite1>("Rushbase StringSuite", 1);
+};
+
+}  // namespace calmframe::host

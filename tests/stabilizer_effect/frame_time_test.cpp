@@ -1,0 +1,40 @@
+#include "stabilizer/effect/src/frame_time.h"
+
+#include <gtest/gtest.h>
+
+#include <boost/rational.hpp>
+
+namespace kelp::effect {
+namespace {
+
+TEST(FrameTimeTest, WhatDoesNotFitIsHalvedRoundedUpAndReduced) {
+  struct Case {
+    std::int64_t frame;
+    analysis::RationalTime duration;
+    HostTime at;
+  };
+  constexpr Case cases[] = {
+      {7, {1, 25}, {7, 1, 25}},
+      {-3, {1001, 30000}, {-3003, 1001, 30000}},
+      {2145337, {1001, 30000}, {2147482337, 1001, 30000}},  // the last that fits
+      {2200001, {1001, 30000}, {1101100501, 500, 15000}},   // 2202201001 / 2, rounded up
+      {3000000, {1001, 30000}, {100100, 1, 1}},             // 1501500000 / 15000
+  };
+  for (const Case& c : cases) {
+    const HostTime at = FrameTime(c.frame, c.duration);
+    EXPECT_EQ(at.time, c.at.time) << c.frame;
+    EXPECT_EQ(at.step, c.at.step) << c.frame;
+    EXPECT_EQ(at.scale, c.at.scale) << c.frame;
+  }
+  EXPECT_THROW(FrameTime(10000, {1000000, 1}), boost::bad_rational);
+}
+
+TEST(FrameTimeTest, AClockCountsFromTheLayersFirstFrame) {
+  const FrameClock clock{12, {1, 50}};
+  EXPECT_EQ(clock.At(12).time, 0);
+  EXPECT_EQ(clock.At(37).time, 25);
+  EXPECT_EQ(clock.At(37).scale, 50u);
+}
+
+}  // namespace
+}  // namespace kelp::effect
