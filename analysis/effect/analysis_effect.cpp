@@ -8,7 +8,6 @@
 #include "analysis/effect/analysis_parameter_rules.h"
 #include "analysis/effect/analysis_strings.h"
 #include "analysis/effect/effect_parameters.h"
-#include "analysis/src/identities.h"
 #include "analysis/src/read_job_input.h"
 #include "effect/host_requests.h"
 #include "effect/host_text.h"

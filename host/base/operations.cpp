@@ -3,6 +3,12 @@
 #include <algorithm>
 
 namespace calmframe::host {
+namespace {
+
+// The first ones tell; a plug-in that repeats one for ever shall not fill the memory.
+constexpr std::size_t kMistakes = 100;
+
+}  // namespace
 
 Operations& Operations::Get() {
   static Operations operations;
@@ -67,13 +73,15 @@ void Ledger::Take(const std::string& kind, std::int64_t count) {
 void Ledger::GiveBack(const std::string& kind, std::int64_t count) {
   std::lock_guard lock(mutex_);
   std::int64_t& held = held_[kind];
-  if (held < count) mistakes_.push_back(kind + ": given back but not held");
+  if (held < count && mistakes_.size() < kMistakes) {
+    mistakes_.push_back(kind + ": given back but not held");
+  }
   held = std::max<std::int64_t>(held - count, 0);
 }
 
 void Ledger::Mistake(const std::string& what) {
   std::lock_guard lock(mutex_);
-  mistakes_.push_back(what);
+  if (mistakes_.size() < kMistakes) mistakes_.push_back(what);
 }
 
 std::map<std::string, std::int64_t> Ledger::held() const {

@@ -70,7 +70,7 @@ class Ledger {
   void Take(const std::string& kind, std::int64_t count = 1);
   // A kind that falls below 0 is a mistake, and stays at 0.
   void GiveBack(const std::string& kind, std::int64_t count = 1);
-  void Mistake(const std::string& what);
+  void Mistake(const std::string& what);  // the first 100 are kept
 
   // Kinds with a count above 0.
   std::map<std::string, std::int64_t> held() const;

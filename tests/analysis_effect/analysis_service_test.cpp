@@ -210,7 +210,9 @@ TEST_F(AnalysisServiceTest, TheSaveButtonWritesTheTracksWhereTheUserSays) {
 
 // Every operation of the host fails once, wherever it comes in a short life of an instance.
 TEST_F(AnalysisServiceTest, AnInstanceSurvivesTheFailureOfAnyOperation) {
-  layer_.count = 1;
+  layer_.count = 1;  // one small frame, so that a life is short
+  layer_.nodes[0].properties[HX_PROPERTY_STREAM_WIDTH] = "40";
+  layer_.nodes[0].properties[HX_PROPERTY_STREAM_HEIGHT] = "32";
   std::set<std::string> failed_operations;
   for (int n = 1;; ++n) {
     host_.ForgetOperations();

@@ -96,9 +96,9 @@ class TestEffect final : public AnalysisEffect {
   }
   void DropSolveJob() override { ++log.dropped_solves; }
   void CreateStateInHandle(HX_Handle handle, bool keep_jobs) override {
-    auto state = std::make_unique<AnalysisState>();
+    const kelp::effect::HandleLock slot = Slot(handle);
+    auto* const state = *slot.as<AnalysisState*>() = new AnalysisState;
     state->keep_jobs = keep_jobs;
-    *Slot(handle).as<AnalysisState*>() = state.release();
   }
   HX_Handle AllocateInstanceHandle(std::uint64_t) override {
     const HX_Handle handle = context().in->cb->new_handle(sizeof(AnalysisState*));

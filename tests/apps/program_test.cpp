@@ -12,6 +12,8 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <nlohmann/json.hpp>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -163,6 +165,13 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
                {"stabilize a b --smoothness nan", "nan"},
                {"stabilize a b --additional-scale=-inf", "inf"},
                {"stabilize a b --depth 12", "12"},
+               {"stabilize a b --json --quiet", "--quiet"},
+               {"params --param Smothness=3", "did you mean 'Smoothness'?"},
+               {"params --param \"Maximum Scale=99\"", "100 to 10000"},
+               {"params --param \"Method=Perspectiv\"", "did you mean Perspective?"},
+               {"params --param Rank=4", "no parameter 'Rank'"},
+               {"params --param \"Hide Warning Banner=maybe\"", "neither on nor off"},
+               {"params --param Smoothness", "NAME=VALUE"},
                {"stabilize a", "OUT"},
                {"", "calmframe --help"}};
   for (const auto& c : cases) {
@@ -171,6 +180,46 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
     ExpectOneLine(outcome, c.part);
   }
   EXPECT_EQ(Run("stabilize --help").code, 0);
+}
+
+TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {
+  const Outcome plain = Run("params --param smoothness=30 --method perspective");
+  EXPECT_EQ(plain.code, 0) << plain.text;
+  EXPECT_THAT(plain.text, HasSubstr("0 to 1000 (default 50), now 30\n"));
+  EXPECT_THAT(plain.text, HasSubstr("(default Subspace Warp), now Perspective\n"));
+  EXPECT_THAT(plain.text, ::testing::Not(HasSubstr("AnalysisStatusCounter")));
+  const auto json = nlohmann::json::parse(Run("params --json --experimental --param Rank=4").text);
+  const auto rank = std::find_if(json.begin(), json.end(),
+                                 [](const nlohmann::json& p) { return p["name"] == "Rank"; });
+  ASSERT_NE(rank, json.end());
+  EXPECT_EQ((*rank)["id"], 203);
+  EXPECT_EQ((*rank)["value"], 4);
+  EXPECT_EQ((*rank)["default"], 9);
+}
+
+TEST_F(ProgramTest, JsonTellsEachStageAndHowItEnded) {
+  MakeClip("in.mp4", 160, 120, 30);
+  const Outcome outcome = Run("stabilize in.mp4 out.mp4 --json --param \"Maximum Scale=120\"");
+  EXPECT_EQ(outcome.code, 0) << outcome.text;
+  std::vector<std::string> ended;
+  std::istringstream lines(outcome.text);
+  for (std::string line; std::getline(lines, line);) {
+    const auto object = nlohmann::json::parse(line);
+    if (object.value("share", 0.0) == 1.0) ended.push_back(object["stage"]);
+  }
+  EXPECT_THAT(ended, ::testing::ElementsAre("analyzing", "solving", "rendering"));
+  const Outcome failed = Run("stabilize missing.mp4 out2.mp4 --json");
+  EXPECT_EQ(failed.code, 3);
+  EXPECT_EQ(nlohmann::json::parse(failed.text)["exit_code"], 3);
+}
+
+TEST_F(ProgramTest, AnalyzeTellsWithoutRendering) {
+  MakeClip("in.mp4", 160, 120, 30);
+  const Outcome plain = Run("analyze in.mp4 --quiet");
+  EXPECT_EQ(plain.code, 0) << plain.text;
+  EXPECT_THAT(plain.text, HasSubstr("in.mp4: 30 frames of 160x120\ncrop window "));
+  EXPECT_THAT(plain.text, HasSubstr("Auto-scale (1"));
+  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4"));
 }
 
 TEST_F(ProgramTest, InterruptLeavesNothingBehind) {

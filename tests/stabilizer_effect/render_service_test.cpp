@@ -171,7 +171,6 @@ TEST_F(RenderServiceTest, WhatIsNotFinishedIsTheInputWithABanner) {
   ASSERT_EQ(RenderDirect(output), HX_ERR_NONE);
   ExpectColumn(output, 40, 46, 40, 0.3);
   EXPECT_GT(std::abs(100 * output.At(1, 12, 1) - 1), 20) << "the band";
-  TestWorld plain = output;
   test.Set(kHideWarningBannerIndex, 1);
   ASSERT_EQ(RenderDirect(output), HX_ERR_NONE);
   for (int y = 0; y < kHeight; ++y) ExpectColumn(output, 1, y, 1, 0.3);

@@ -28,6 +28,8 @@ boost::shared_ptr<const marrow::stabilization::CPWarper> ShiftingWarper(
 class TestWorld {
  public:
   TestWorld(int width, int height, std::int32_t depth, int origin_x = 0, int origin_y = 0);
+  TestWorld(TestWorld&&) = default;
+  TestWorld& operator=(TestWorld&&) = default;
   HX_World* get() { return &world_; }
   // One channel, 0 to 1: 0 alpha, 1 red, 2 green, 3 blue.
   double At(int x, int y, int channel) const;

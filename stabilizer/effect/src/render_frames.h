@@ -5,6 +5,7 @@
 #include <boost/shared_ptr.hpp>
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <utility>
 
 #include "effect/host_context.h"
@@ -29,15 +30,16 @@ class RenderFrames {
 // Of a direct render: what it asks for when it wants it.
 class DirectFrames final : public RenderFrames {
  public:
-  // The clock is asked for when it is needed.
+  // The clock is asked for when it is needed, once.
   DirectFrames(const HostContext& context, boost::function<FrameClock()> clock)
-      : context_(context), clock_(std::move(clock)) {}
+      : context_(context), ask_clock_(std::move(clock)) {}
 
   boost::shared_ptr<HX_World> Input() override {
     return LayerOf(boost::make_shared<ParamCheckout>(context_, 0));
   }
   boost::shared_ptr<HX_World> Frame(std::int64_t frame) override {
-    const HostTime at = clock_().At(frame);
+    if (!clock_) clock_ = ask_clock_();
+    const HostTime at = clock_->At(frame);
     return LayerOf(boost::make_shared<ParamCheckout>(context_, 0, at.time, at.step, at.scale));
   }
 
@@ -47,7 +49,8 @@ class DirectFrames final : public RenderFrames {
   }
 
   const HostContext& context_;
-  const boost::function<FrameClock()> clock_;
+  const boost::function<FrameClock()> ask_clock_;
+  std::optional<FrameClock> clock_;
 };
 
 // Of a planned render: what its plan ordered, by absolute index.

@@ -166,10 +166,8 @@ void StabilizerEffect::PlanFrame() {
     plan.full_rect = input.full_rect;
     return;
   }
-  if (!GetState()) {
-    CreateStateInHandle(in.instance_handle, true);
-    AttachSharedData(true);
-  }
+  if (!GetState()) CreateStateInHandle(in.instance_handle, true);
+  AttachSharedData(true);
   StabilizerState& state = *GetState();
   state.TakeOver();
 

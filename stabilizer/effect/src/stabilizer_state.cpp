@@ -185,7 +185,7 @@ void StabilizerState::TakeOver() {
   source_height = contents.source_height;
   par_num = contents.par_num;
   par_den = contents.par_den;
-  analyzer = std::move(contents.analyzer);
+  if (keep_jobs) analyzer = std::move(contents.analyzer);
   phase = contents.solve_status;
   needs_solve = contents.needs_solve;
   first_analysis = contents.first_solve;

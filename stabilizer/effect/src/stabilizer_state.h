@@ -65,8 +65,8 @@ class StabilizerState final : public analysis::AnalysisState {
   bool IsOverCropped(const ParameterReader& params) const;
 
   // Both ways between a state and what its renders share. Publish's gpu_allowed: whether an outside
-  // renderer may draw the frames. TakeOver leaves the track table of a user interface instance
-  // alone, so that a save never loses it.
+  // renderer may draw the frames. TakeOver leaves the track table and the analyzer of a user
+  // interface instance alone, so that neither a save nor a poll loses them.
   void Publish(bool gpu_allowed) const;
   void TakeOver();
 
