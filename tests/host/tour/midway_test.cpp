@@ -19,10 +19,10 @@ constexpr std::int64_t kFrames = 8;
 
 struct Place {
   const char* name;
-  Work work;                   // that is under way
-  std::int64_t frame = -1;     // whose drawing is held
-  const char* stage = nullptr; // of the solve that is held
-  int ticks = 0;               // beyond what leads there
+  Work work;                    // that is under way
+  std::int64_t frame = -1;      // whose drawing is held
+  const char* stage = nullptr;  // of the solve that is held
+  int ticks = 0;                // beyond what leads there
 };
 
 constexpr Place kPlaces[] = {
@@ -54,7 +54,7 @@ class Midway : public PlayedPlugin {
       std::optional<std::jthread> release;
       ShakyClip clip{96, 64, kFrames, place.name};
       clip.on_draw = [&](std::int64_t frame) {
-        if (frame == place.frame) hold.Pass();
+        if (frame == place.frame % kFrames) hold.Pass();
       };
       if (place.stage) stages.HoldAt(place.stage, &hold);
       layer_ = MakeLayer(clip);
@@ -80,12 +80,11 @@ class Midway : public PlayedPlugin {
   }
 
   void Reach(const Place& place, Hold& hold) {
-    if (place.frame < kFrames) {
-      while (!hold.Reached(5ms)) session().Tick();
-      return;
-    }
-    session().Tick();  // the start; all frames are let go at the job's end
-    while (host().media().counts().references == 0) std::this_thread::sleep_for(1ms);
+    while (!hold.Reached(5ms)) session().Tick();
+    if (place.frame < kFrames) return;
+    session().Tick();  // sees it run
+    hold.Release();
+    // A job lets its frames go at its end.
     while (host().media().counts().references > 0) std::this_thread::sleep_for(1ms);
   }
 
@@ -161,8 +160,9 @@ TEST_F(Midway, WhatIsSolvedIsWhatTheControlsSayAtTheEnd) {
     EXPECT_EQ(Settle(effect), 8);
     EXPECT_EQ(stages().Take(), "factorization crop ") << place.name;
     const auto frame = effect.MakeRenderer()->Planned({3}).OnLayer();
-    Effect& fresh = session().Load(MakeLayer({96, 64, kFrames, "fresh"}),
-                                   {"KLPX SubspaceStabilizer", effect.shared()->params().Values(), {}});
+    Effect& fresh =
+        session().Load(MakeLayer({96, 64, kFrames, "fresh"}),
+                       {"KLPX SubspaceStabilizer", effect.shared()->params().Values(), {}});
     EXPECT_EQ(Settle(fresh), 8);
     EXPECT_EQ(Difference(*frame, *fresh.MakeRenderer()->Planned({3}).OnLayer()), 0);
     ExpectUsable(effect);

@@ -13,8 +13,8 @@ struct ShakyClip {
   int width = 320, height = 240;
   std::int64_t frames = 24;
   std::string name = "shaky clip";
-  double tremor = 1;                                // times that of CameraX and CameraY
-  bool flat = false;                                // one grey: nothing to track
+  double tremor = 1;                                     // times that of CameraX and CameraY
+  bool flat = false;                                     // one grey: nothing to track
   std::function<void(std::int64_t frame)> on_draw = {};  // on the thread that draws, first
 };
 
