@@ -3,8 +3,10 @@
 #include <chrono>
 #include <condition_variable>
 #include <mutex>
+#include <stdexcept>
 #include <string>
 #include <thread>
+#include <utility>
 
 #include "platform/tessel/debug.h"
 
@@ -65,6 +67,11 @@ class SolveStages {
     line_ = line;
     hold_ = hold;
   }
+  // Solves fail where they say the line, which begins a stage; none for an empty one.
+  void FailAt(const std::string& line) {
+    std::lock_guard lock(mutex_);
+    failing_ = line;
+  }
   // Of what was said since the last look: "factorization ", "crop " or both.
   std::string Take() {
     std::lock_guard lock(mutex_);
@@ -81,14 +88,17 @@ class SolveStages {
     {
       std::lock_guard lock(mutex_);
       text_ += line;
+      if (!failing_.empty() && line.find(failing_) != std::string::npos) {
+        throw std::runtime_error("failed on purpose");
+      }
       if (hold_ && line.find(line_) != std::string::npos) std::swap(hold, hold_);
     }
     if (hold) hold->Pass();
   }
 
   std::mutex mutex_;
-  std::string text_, line_;  // guarded by mutex_
-  Hold* hold_ = nullptr;     // guarded by mutex_
+  std::string text_, line_, failing_;  // guarded by mutex_
+  Hold* hold_ = nullptr;               // guarded by mutex_
 };
 
 }  // namespace calmframe::host

@@ -25,6 +25,7 @@ enum : std::int32_t {
   kAutoScale = 10,
   kMaximumScale = 11,
   kDetailedAnalysis = 17,
+  kCropLessSmoothMore = 19,
   kHideBanner = 28
 };
 

@@ -14,7 +14,6 @@ struct ShakyClip {
   std::int64_t frames = 24;
   std::string name = "shaky clip";
   double tremor = 1;                                     // times that of CameraX and CameraY
-  bool flat = false;                                     // one grey: nothing to track
   std::function<void(std::int64_t frame)> on_draw = {};  // on the thread that draws, first
 };
 
@@ -57,8 +56,8 @@ inline SourcePtr MakeShakyClip(const ShakyClip& clip = {}) {
   return MakeDrawnSource(info, [clip](std::int64_t frame, Picture& picture) {
     if (clip.on_draw) clip.on_draw(frame);
     const double dx = clip.tremor * CameraX(frame), dy = clip.tremor * CameraY(frame);
-    FillPicture(picture, [=, flat = clip.flat](int x, int y) {
-      const auto value = flat ? 0.5f : static_cast<float>(Noise(x + dx, y + dy));
+    FillPicture(picture, [=](int x, int y) {
+      const auto value = static_cast<float>(Noise(x + dx, y + dy));
       return HX_PixelFloat{1.0f, value, value * 0.8f, 1.0f - value};
     });
   });

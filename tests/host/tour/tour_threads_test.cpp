@@ -88,16 +88,5 @@ TEST_F(TourThreads, RendersGoOnWhileTheEffectIsPlayedWith) {
   }
 }
 
-TEST_F(TourThreads, DestroyedAtAnyTimeItLeavesNothing) {
-  for (int delay = 0; delay < 24; ++delay) {
-    Effect& effect = session().Apply(MakeLayer({96, 64, 12, "destroyed"}));
-    for (int i = 0; i < delay / 2; ++i) {
-      session().Tick();
-      std::this_thread::sleep_for(std::chrono::milliseconds(1 + delay % 5));
-    }
-    session().Remove(effect);
-  }
-}
-
 }  // namespace
 }  // namespace calmframe::host
