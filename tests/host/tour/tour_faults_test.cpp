@@ -23,9 +23,9 @@ class TourFaults : public PlayedPlugin {
   // order must be ones that a user can do something with.
   void Play() {
     const auto expect_clear = [](const CommandResult& result) {
-      static const std::set<HX_Err> kClear = {
-          HX_ERR_NONE, kFaultCode, HX_ERR_MEMORY, HX_ERR_MISSING_SUITE, HX_ERR_HANDLE_LOCK,
-          HX_ERR_NO_INSTANCE};
+      static const std::set<HX_Err> kClear = {HX_ERR_NONE,        kFaultCode,
+                                              HX_ERR_MEMORY,      HX_ERR_MISSING_SUITE,
+                                              HX_ERR_HANDLE_LOCK, HX_ERR_NO_INSTANCE};
       EXPECT_TRUE(kClear.count(result.code) || !result.message.empty()) << result.code;
       EXPECT_TRUE(result.code != HX_ERR_MISSING_SUITE ||
                   result.message == "Not able to acquire OVK Suite.")
