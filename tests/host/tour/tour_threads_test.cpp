@@ -17,7 +17,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr std::int64_t kFrames = 20, kMostStart = 4;
+constexpr std::int64_t kFrames = 30, kMostStart = 4;
 constexpr std::size_t kMostEffects = 4;
 
 class TourThreads : public PlayedPlugin {
@@ -98,7 +98,7 @@ class TourThreads : public PlayedPlugin {
     const boost::shared_ptr<Layer>& layer = layers[random() % layers.size()];
     Effect& effect = *effects[random() % effects.size()];
     const bool room = effects.size() < kMostEffects;
-    switch (random() % 20) {
+    switch (random() % 19) {
       case 0:
       case 1:
         effect.Press(kAnalyze);  // refused where it is disabled
@@ -113,33 +113,30 @@ class TourThreads : public PlayedPlugin {
         effect.SetParam(kSmoothness, random() % 100);
         break;
       case 5:
-        effect.SetParam(kDetailedAnalysis, random() % 2);
-        break;
-      case 6:
         EXPECT_TRUE(effect.Save(&saved_).ok());
         break;
-      case 7:
+      case 6:
         Session::PauseBackgroundWork(random() % 2 == 0);
         break;
-      case 8:
+      case 7:
         layer->Change([&](LayerState& state) {
           state.start_frame = static_cast<std::int32_t>(random() % (kMostStart + 1));
           state.length = static_cast<std::int32_t>(kFrames - kMostStart);
         });
         break;
-      case 9:
+      case 8:
         layer->Change([&](LayerState& state) { state.refusal = random() % 2 ? "" : "Not now."; });
         break;
-      case 10:
+      case 9:
         if (room) Keep(session().Apply(layer));
         break;
-      case 11:
+      case 10:
         if (room && !saved_.instance.empty()) Keep(session().Load(layer, saved_));
         break;
-      case 12:
+      case 11:
         if (Effect* const copy = room ? session().Duplicate(effect, layer) : nullptr) Keep(*copy);
         break;
-      case 13:
+      case 12:
         if (effects.size() > 1) Drop(effect);
         break;
       default:
