@@ -208,6 +208,8 @@ void StabilizerEffect::ReloadInstance() {
     }
   }
   CreateInstanceState(false);
+  // The project's counter may tell of work that nobody does any more.
+  if (GetState()) PublishStatus(FrameStatus::PressAnalyze);
   ForceRerender(context());
 }
 
