@@ -4,6 +4,7 @@
 #include <memory>
 #include <nlohmann/json.hpp>
 
+#include "apps/calmframe/project_work.h"
 #include "apps/calmframe/steady_clip.h"
 #include "platform/tessel/threads.h"
 
@@ -18,6 +19,7 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
     : command_(program.add_subcommand("analyze",
                                       "Tell what would become of a clip, without rendering it")) {
   command_->add_option("IN", input_, "The shaky clip")->required();
+  AddProjectFlag(*command_, project_);
   AddControlFlags(*command_, controls_);
   AddRunFlags(*command_, run_);
 }
@@ -25,10 +27,11 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
 void AnalyzeCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
-  SteadyClip clip(input_, controls_);
+  const std::unique_ptr<SteadyClip> taken = TakeUp(input_, project_, controls_);
+  SteadyClip& clip = *taken;
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
-  clip.Work(progress);
+  WorkAndLeave(clip, project_, progress);
   const std::unique_ptr<CropWindow> crop = clip.Crop();
   if (run_.json) {
     nlohmann::ordered_json json;

@@ -18,7 +18,7 @@ class AnalyzeCommand {
 
  private:
   CLI::App* const command_;
-  std::string input_;
+  std::string input_, project_;
   ControlFlags controls_;
   RunFlags run_;
 };

@@ -122,7 +122,7 @@ void DemoCommand::Run() {
   flags.encode = Encoding(flags_.encode);
 
   WriteSample(shaky, frames_, flags.encode, progress);
-  Stabilize(shaky, steady, controls_, flags, run_.threads, progress);
+  Stabilize(shaky, steady, "", controls_, flags, run_.threads, progress);
   WriteSideBySide(shaky, steady, both, flags.encode, progress);
   if (run_.progress_form() == ProgressLine::Form::line) {
     std::fprintf(stderr, "wrote %s, %s and %s\n", shaky.c_str(), steady.c_str(), both.c_str());

@@ -13,6 +13,7 @@
 #include "apps/calmframe/nearest_match.h"
 #include "apps/calmframe/params_command.h"
 #include "apps/calmframe/progress_line.h"
+#include "apps/calmframe/project_commands.h"
 #include "apps/calmframe/stabilize_command.h"
 #include "host/media/clip.h"
 
@@ -69,6 +70,9 @@ int Run(int argc, char** argv) {
   DemoCommand demo(program);
   AnalyzeCommand analyze(program);
   ParamsCommand params(program);
+  RenderCommand render(program);
+  InfoCommand info(program);
+  TracksCommand tracks(program);
   try {
     program.parse(argc, argv);
   } catch (const CLI::Success& success) {
@@ -77,13 +81,16 @@ int Run(int argc, char** argv) {
     return FailUsage(program, error, argc, argv);
   }
 
-  const bool json = stabilize.json() || demo.json() || analyze.json();
+  const bool json = stabilize.json() || demo.json() || analyze.json() || render.json();
   CatchInterrupts();
   try {
     if (stabilize.chosen()) stabilize.Run();
     if (demo.chosen()) demo.Run();
     if (analyze.chosen()) analyze.Run();
     if (params.chosen()) params.Run();
+    if (render.chosen()) render.Run();
+    if (info.chosen()) info.Run();
+    if (tracks.chosen()) tracks.Run();
     return kDone;
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);
@@ -92,6 +99,8 @@ int Run(int argc, char** argv) {
   } catch (const media::Failure& failure) {
     return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what(),
                 json);
+  } catch (const host::ProjectFailure& failure) {
+    return Fail(kInput, failure.what(), json);
   } catch (const SolveFailure& failure) {
     return Fail(kSolveFailed, failure.what(), json);
   } catch (const std::bad_alloc&) {

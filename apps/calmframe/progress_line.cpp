@@ -82,6 +82,7 @@ std::string ProgressJson(const Progress& progress, double elapsed_seconds) {
     json["unit"] = progress.unit;
   }
   if (!progress.says.empty()) json["says"] = progress.says;
+  if (progress.ends) json["ended"] = true;
   json["elapsed"] = std::round(elapsed_seconds * 1000) / 1000;
   return json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
 }
@@ -114,10 +115,18 @@ void ProgressLine::Show(const Progress& progress) {
 }
 
 void ProgressLine::Warn(const std::string& line) {
+  Tell("warning", line);
+}
+
+void ProgressLine::Note(const std::string& line) {
+  if (form_ != Form::none) Tell("note", line);
+}
+
+void ProgressLine::Tell(const char* key, const std::string& line) {
   if (line_open_) std::fputc('\n', stderr);
   line_open_ = false;
   if (form_ == Form::json) {
-    const nlohmann::json json = {{"warning", line}};
+    const nlohmann::json json = {{key, line}};
     std::fprintf(stderr, "%s\n",
                  json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace).c_str());
   } else {

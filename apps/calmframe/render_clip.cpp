@@ -50,15 +50,17 @@ FramePixels RenderFrame(host::Renderer& renderer, std::int64_t frame, int depth,
   return first;
 }
 
-// Frames 0 .. count - 1, rendered ahead on threads of its own, each of which has a render side of
+// Frames of the range, rendered ahead on threads of its own, each of which has a render side of
 // the effect.
 class RenderAhead {
  public:
-  RenderAhead(SteadyClip& clip, int depth, int threads)
+  RenderAhead(SteadyClip& clip, const FrameRange& range, int depth, int threads)
       : clip_(clip),
         depth_(depth),
-        count_(static_cast<std::int64_t>(clip.info().frame_count)),
-        window_(threads + 2) {
+        end_(static_cast<std::int64_t>(range.end)),
+        window_(threads + 2),
+        next_(static_cast<std::int64_t>(range.first)),
+        taken_(next_) {
     for (int i = 0; i < threads; ++i) threads_.emplace_back([this] { RenderFrames(); });
   }
   ~RenderAhead() {
@@ -91,7 +93,7 @@ class RenderAhead {
       std::unique_lock lock(mutex_);
       while (true) {
         changed_.wait(lock, [&] { return stopped_ || failure_ || next_ < taken_ + window_; });
-        if (stopped_ || failure_ || next_ >= count_) return;
+        if (stopped_ || failure_ || next_ >= end_) return;
         const std::int64_t frame = next_++;
         lock.unlock();
         FramePixels pixels = RenderFrame(*renderer, frame, depth_, clip_.info().field_order);
@@ -108,11 +110,11 @@ class RenderAhead {
 
   SteadyClip& clip_;
   const int depth_;
-  const std::int64_t count_;
+  const std::int64_t end_;
   const std::int64_t window_;  // frames that may be ahead of the one wanted
   std::mutex mutex_;           // guards all below but the threads
   std::condition_variable changed_;
-  std::int64_t next_ = 0, taken_ = 0;
+  std::int64_t next_, taken_;
   std::map<std::int64_t, FramePixels> done_;
   std::exception_ptr failure_;
   bool stopped_ = false;
@@ -133,19 +135,19 @@ void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer
 
 }  // namespace
 
-void RenderClip(SteadyClip& clip, int depth, int threads, media::ClipWriter& writer,
-                ProgressLine& progress) {
+void RenderClip(SteadyClip& clip, const FrameRange& range, int depth, int threads,
+                media::ClipWriter& writer, ProgressLine& progress) {
   const media::ClipInfo& info = clip.info();
   if (depth == 0) depth = info.bit_depth > 8 ? 16 : 8;
   if (threads == 0) threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
   constexpr int kMostInWork = 8;  // each holds some frames; the strips of one use all processors
-  RenderAhead frames(clip, depth, std::min(threads, kMostInWork));
-  Progress shown{"rendering", 0, static_cast<double>(info.frame_count), "frames", "", false};
-  for (std::size_t frame = 0; frame < info.frame_count; ++frame) {
+  RenderAhead frames(clip, range, depth, std::min(threads, kMostInWork));
+  Progress shown{"rendering", 0, static_cast<double>(range.end - range.first), "frames", "", false};
+  for (std::size_t frame = range.first; frame < range.end; ++frame) {
     if (InterruptAsked()) throw Interrupted();
-    shown.done = static_cast<double>(frame);
+    shown.done = static_cast<double>(frame - range.first);
     progress.Show(shown);
-    Write(writer, frame, *frames.Take(static_cast<std::int64_t>(frame)));
+    Write(writer, frame - range.first, *frames.Take(static_cast<std::int64_t>(frame)));
   }
   clip.CheckMedia();
   shown.done = shown.total;

@@ -6,11 +6,16 @@
 
 namespace calmframe {
 
-// Renders every frame of a solved clip, several at a time, and hands them to the writer in order.
-// depth: 8, 16 or 32 (float) bits of a component, 0 the least that holds the source. threads:
-// frames in work at once, 0 as many as there are processors. Throws Interrupted, SolveFailure,
-// media::Failure.
-void RenderClip(SteadyClip& clip, int depth, int threads, media::ClipWriter& writer,
-                ProgressLine& progress);
+// Frames of a clip, the end excluded.
+struct FrameRange {
+  std::size_t first = 0, end = 0;
+};
+
+// Renders a solved clip's frames, several at a time, and hands them to the writer in order, counted
+// from the range's first. depth: 8, 16 or 32 (float) bits of a component, 0 the least that holds
+// the source. threads: frames in work at once, 0 as many as there are processors. Throws
+// Interrupted, SolveFailure, media::Failure.
+void RenderClip(SteadyClip& clip, const FrameRange& range, int depth, int threads,
+                media::ClipWriter& writer, ProgressLine& progress);
 
 }  // namespace calmframe

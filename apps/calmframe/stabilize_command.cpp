@@ -4,14 +4,11 @@
 #include <vector>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
-#include "apps/calmframe/steady_clip.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
-namespace {
-
-// Refuses a clip of which nothing would be seen, and tells of one that loses much.
 void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
   const std::unique_ptr<CropWindow> crop = clip.Crop();
   if (!crop) return;
@@ -31,8 +28,6 @@ void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
                   " stay in view; less --smoothness or --framing stabilize-only keeps more");
   }
 }
-
-}  // namespace
 
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
   command.add_option("--threads", flags.threads, "Processors to use")
@@ -65,17 +60,19 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
       ->group("Output");
 }
 
-void Stabilize(const std::string& input, const std::string& output, const ControlFlags& controls,
-               const OutputFlags& flags, int threads, ProgressLine& progress) {
+void Stabilize(const std::string& input, const std::string& output, const std::string& project,
+               const ControlFlags& controls, const OutputFlags& flags, int threads,
+               ProgressLine& progress) {
   const tessel::threads::ProcessorLimit limit(threads);
-  SteadyClip clip(input, controls);
-  if (!clip.info().warning.empty()) progress.Warn(clip.info().warning);
+  const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls);
+  const media::ClipInfo& info = clip->info();
+  if (!info.warning.empty()) progress.Warn(info.warning);
   // Made first, so that an output that cannot be written costs nobody an analysis.
-  const std::unique_ptr<media::ClipWriter> writer = media::ClipWriter::Create(
-      output, clip.info(), clip.info().width, clip.info().height, flags.encode);
-  clip.Work(progress);
-  CheckCrop(clip, progress);
-  RenderClip(clip, flags.depth, threads, *writer, progress);
+  const std::unique_ptr<media::ClipWriter> writer =
+      media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
+  WorkAndLeave(*clip, project, progress);
+  CheckCrop(*clip, progress);
+  RenderClip(*clip, {0, info.frame_count}, flags.depth, threads, *writer, progress);
   writer->Finish();
   for (const std::string& line : writer->warnings()) progress.Warn(line);
 }
@@ -85,6 +82,7 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
   command_->add_option("IN", input_, "The shaky clip")->required();
   command_->add_option("OUT", output_, "The steady clip to write; - for raw frames to a pipe")
       ->required();
+  AddProjectFlag(*command_, project_);
   AddControlFlags(*command_, controls_);
   AddOutputFlags(*command_, flags_);
   AddRunFlags(*command_, run_);
@@ -92,7 +90,7 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
 
 void StabilizeCommand::Run() {
   ProgressLine progress(run_.progress_form());
-  Stabilize(input_, output_, controls_, flags_, run_.threads, progress);
+  Stabilize(input_, output_, project_, controls_, flags_, run_.threads, progress);
 }
 
 }  // namespace calmframe

@@ -5,6 +5,7 @@
 
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
+#include "apps/calmframe/steady_clip.h"
 #include "host/media/clip.h"
 
 namespace calmframe {
@@ -30,9 +31,14 @@ struct OutputFlags {
 };
 void AddOutputFlags(CLI::App& command, OutputFlags& flags);
 
-// From a file to a file. Throws media::Failure, UsageFailure, SolveFailure, Interrupted.
-void Stabilize(const std::string& input, const std::string& output, const ControlFlags& controls,
-               const OutputFlags& flags, int threads, ProgressLine& progress);
+// From a file to a file. `project`: where saved work is taken up, if it is there, and left; empty
+// for none. Throws media::Failure, UsageFailure, SolveFailure, host::ProjectFailure, Interrupted.
+void Stabilize(const std::string& input, const std::string& output, const std::string& project,
+               const ControlFlags& controls, const OutputFlags& flags, int threads,
+               ProgressLine& progress);
+
+// Refuses a clip of which nothing would be seen, and tells of one that loses much.
+void CheckCrop(SteadyClip& clip, ProgressLine& progress);
 
 // `calmframe stabilize IN OUT`. Added to the program's parser; runs when that has chosen it.
 class StabilizeCommand {
@@ -44,7 +50,7 @@ class StabilizeCommand {
 
  private:
   CLI::App* const command_;
-  std::string input_, output_;
+  std::string input_, output_, project_;
   ControlFlags controls_;
   OutputFlags flags_;
   RunFlags run_;

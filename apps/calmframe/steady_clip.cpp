@@ -12,6 +12,7 @@ namespace calmframe {
 namespace {
 
 // Disk ids of the effect's parameters.
+constexpr std::int32_t kAnalyzeButton = 1;
 constexpr std::int32_t kCancelButton = 11;
 constexpr std::int32_t kStabilizationGroup = 12;
 
@@ -69,14 +70,37 @@ std::string FailureText(int status, const std::vector<std::string>& messages) {
 
 }  // namespace
 
-SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls) try
-    : info_(InfoOf(path)),
+std::string Reuse::Text() const {
+  if (!analysis) return "";
+  if (!solve) return "reused the analysis";
+  return framing ? "reused the analysis, the solve and the framing"
+                 : "reused the analysis and the solve";
+}
+
+SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls)
+    : SteadyClip(nullptr, path, controls) {}
+
+SteadyClip::SteadyClip(const host::Project& project, const std::string& path,
+                       const ControlFlags& controls)
+    : SteadyClip(&project, path, controls) {}
+
+SteadyClip::SteadyClip(const host::Project* project, const std::string& path,
+                       const ControlFlags& controls) try
+    : path_(path),
+      info_(InfoOf(path)),
       host_(PluginPath(), SettingsFor(info_, controls)),
       values_(ResolveControls(controls, host_.declarations())),
       session_(host_) {
   const auto layer = boost::make_shared<host::Layer>(host::OpenClip(path));
-  layer->Change([&](host::LayerState& state) { state.name = state.file_name = path; });
-  effect_ = &session_.Apply(layer);
+  layer->Change([&](host::LayerState& state) {
+    state.name = state.file_name = path;
+    if (!project) return;
+    state.start_frame = project->start_frame;
+    state.length = project->length;
+    state.ticks_per_frame = project->ticks_per_frame;
+    state.field_type = project->field_type;
+  });
+  effect_ = project ? &session_.Load(layer, project->effect) : &session_.Apply(layer);
   if (!effect_->creation().ok()) throw SolveFailure(effect_->creation().Line(path));
   for (const auto& [disk_id, value] : values_) {
     const host::CommandResult result = effect_->SetParam(effect_->IndexOf(disk_id), value);
@@ -86,7 +110,7 @@ SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls) tr
   throw SolveFailure(error.what());
 }
 
-void SteadyClip::Work(ProgressLine& progress) {
+void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
   using Work = host::Session::Work;
   Progress shown;
   const auto show = [&] {
@@ -101,6 +125,8 @@ void SteadyClip::Work(ProgressLine& progress) {
       shown = {};
     }
     if (!stage.empty()) {
+      reuse.framing = false;
+      if (work == Work::analysing) reuse.analysis = false;
       shown.stage = stage;
       shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
       if (ParseFrames(shown.says, &shown.done, &shown.total)) shown.unit = "frames";
@@ -111,11 +137,60 @@ void SteadyClip::Work(ProgressLine& progress) {
   const auto waited = session_.TickUntilSettled(std::chrono::hours(24 * 30), show);
   if (waited != host::Session::Wait::settled) throw Interrupted();
   show();
+}
+
+Reuse SteadyClip::Work(ProgressLine& progress) {
+  Reuse reuse{true, true, true};
+  const void* const warp = FirstWarp();
+  Settle(progress, reuse);
+  // Saved work of another span, of other settings, or of none is not begun anew by itself.
+  const std::int32_t analyze = effect_->IndexOf(kAnalyzeButton);
+  if (const auto button = effect_->Param(analyze);
+      button && (button->ui_flags & HX_PARAM_UI_DISABLED) == 0) {
+    reuse = {};
+    const host::CommandResult pressed = effect_->Press(analyze);
+    if (!pressed.ok()) throw SolveFailure(pressed.Line(path_));
+    Settle(progress, reuse);
+  }
+  reuse.solve = reuse.analysis && warp && warp == FirstWarp();
+  reuse.framing = reuse.framing && reuse.solve;
   CheckMedia();
   const std::vector<std::string> messages = effect_->TakeMessages();
   const int status = host::Session::StatusOf(*effect_);
   if (status != kReady) throw SolveFailure(FailureText(status, messages));
   for (const std::string& message : messages) progress.Warn(message);
+  return reuse;
+}
+
+host::Project SteadyClip::Saved() {
+  host::Project project;
+  const host::CommandResult saved = effect_->Save(&project.effect);
+  if (!saved.ok()) throw SolveFailure(saved.Line(path_));
+  const auto layer = effect_->shared()->layer()->state();
+  project.clip_path = path_;
+  project.clip_content = layer->source->info().content;
+  project.width = info_.width;
+  project.height = info_.height;
+  project.start_frame = layer->start_frame;
+  project.length = layer->length;
+  project.ticks_per_frame = layer->ticks_per_frame;
+  project.field_type = layer->field_type;
+  return project;
+}
+
+const void* SteadyClip::FirstWarp() {
+  const HX_GetStabilizerData get = host_.library().exports().get_stabilizer_data;
+  const HX_GetOVVarVector get_warp = host_.library().exports().get_var_vector;
+  const void* block = host_.opaque_data().Peek(effect_->shared()->reference());
+  std::int32_t frames = 0, ignored;
+  float ignored_bound;
+  if (!get || !get_warp ||
+      !get(block, &frames, &ignored, &ignored, &ignored, &ignored, &ignored, &ignored_bound,
+           &ignored_bound, &ignored_bound, &ignored_bound, &ignored, &ignored) ||
+      frames < 1) {
+    return nullptr;
+  }
+  return get_warp(block, 0);
 }
 
 std::unique_ptr<CropWindow> SteadyClip::Crop() {

@@ -10,6 +10,7 @@
 #include "host/effects/host.h"
 #include "host/effects/session.h"
 #include "host/media/clip.h"
+#include "host/project/project_file.h"
 
 namespace calmframe {
 
@@ -18,20 +19,33 @@ struct CropWindow {
   int width = 0, height = 0;
 };
 
-// A clip on the timeline of a host, with the effect applied to it, its controls set and nothing
-// done yet. For the thread that made it.
+// What of a project's results still stood.
+struct Reuse {
+  bool analysis = false, solve = false, framing = false;
+
+  // "reused the analysis and the solve"; empty for nothing.
+  std::string Text() const;
+};
+
+// A clip on the timeline of a host, with the effect applied to it. For the thread that made it.
 class SteadyClip {
  public:
-  // Throws media::Failure, UsageFailure, and SolveFailure when the effect can't be had.
+  // A clip of which nothing is done yet, or the saved work of one, its controls changed where flags
+  // say so. Throws media::Failure, UsageFailure, and SolveFailure when the effect can't be had.
   SteadyClip(const std::string& path, const ControlFlags& controls);
+  SteadyClip(const host::Project& project, const std::string& path, const ControlFlags& controls);
 
+  const std::string& path() const { return path_; }
   const media::ClipInfo& info() const { return info_; }
   host::Host& host() { return host_; }
   host::Effect& effect() { return *effect_; }
 
-  // Waits until the effect has analysed and solved the clip. Throws Interrupted, SolveFailure,
-  // media::Failure.
-  void Work(ProgressLine& progress);
+  // Waits until the effect has analysed and solved the clip, as far as that is to do. Throws
+  // Interrupted, SolveFailure, media::Failure.
+  Reuse Work(ProgressLine& progress);
+
+  // Throws SolveFailure where the effect can't be saved.
+  host::Project Saved();
 
   // After Work. Null where the framing has none.
   std::unique_ptr<CropWindow> Crop();
@@ -42,6 +56,13 @@ class SteadyClip {
   void CheckMedia();
 
  private:
+  SteadyClip(const host::Project* project, const std::string& path, const ControlFlags& controls);
+  // Ticks until nothing is left to do. What was seen at work is taken from `reuse`.
+  void Settle(ProgressLine& progress, Reuse& reuse);
+  // Address of the first frame's warp, which goes with its solve; null without one.
+  const void* FirstWarp();
+
+  const std::string path_;
   const media::ClipInfo info_;
   host::Host host_;
   const std::map<std::int32_t, double> values_;

@@ -1,0 +1,134 @@
+#include "apps/calmframe/project_commands.h"
+
+#include <cstdio>
+#include <filesystem>
+#include <memory>
+#include <nlohmann/json.hpp>
+#include <optional>
+
+#include "apps/calmframe/failures.h"
+#include "apps/calmframe/project_work.h"
+#include "apps/calmframe/render_clip.h"
+#include "apps/calmframe/steady_clip.h"
+#include "host/project/project_file.h"
+#include "platform/tessel/threads.h"
+#include "platform/tesselui/save_dialog.h"
+
+namespace calmframe {
+namespace {
+
+constexpr std::int32_t kSaveTracksButton = 290;  // disk id
+
+std::unique_ptr<SteadyClip> Open(const std::string& path, const ControlFlags& controls = {}) {
+  const host::Project project = host::LoadProject(path);
+  return std::make_unique<SteadyClip>(project, host::FindClip(path, project), controls);
+}
+
+// The clip as a writer of a part sees it: its other streams belong to the whole.
+media::ClipInfo PartOf(const media::ClipInfo& info, const FrameRange& range) {
+  media::ClipInfo part = info;
+  part.frame_count = range.end - range.first;
+  if (part.frame_count == info.frame_count) return part;
+  part.path.clear();
+  if (!info.times.empty()) {
+    part.times.assign(info.times.begin() + static_cast<std::ptrdiff_t>(range.first),
+                      info.times.begin() + static_cast<std::ptrdiff_t>(range.end));
+  }
+  return part;
+}
+
+}  // namespace
+
+RenderCommand::RenderCommand(CLI::App& program)
+    : command_(program.add_subcommand("render", "Draw saved work, or a part of it")) {
+  command_->add_option("--project", project_, "The saved work")->type_name("FILE")->required();
+  command_->add_option("OUT", output_, "The steady clip to write; - for raw frames to a pipe")
+      ->required();
+  command_->add_option("--from", from_, "First frame, counted from 0")->group("Output");
+  command_->add_option("--to", to_, "Frame behind the last; the clip's end at first")
+      ->group("Output");
+  AddOutputFlags(*command_, flags_);
+  AddRunFlags(*command_, run_);
+}
+
+void RenderCommand::Run() {
+  const tessel::threads::ProcessorLimit limit(run_.threads);
+  ProgressLine progress(run_.progress_form());
+  const std::unique_ptr<SteadyClip> clip = Open(project_);
+  const media::ClipInfo& info = clip->info();
+  const FrameRange range{from_, to_ == 0 ? info.frame_count : to_};
+  if (range.first >= range.end || range.end > info.frame_count) {
+    throw UsageFailure("--from and --to must lie within the clip's " +
+                       std::to_string(info.frame_count) + " frames");
+  }
+  const std::unique_ptr<media::ClipWriter> writer = media::ClipWriter::Create(
+      output_, PartOf(info, range), info.width, info.height, flags_.encode);
+  WorkAndLeave(*clip, project_, progress);
+  CheckCrop(*clip, progress);
+  RenderClip(*clip, range, flags_.depth, run_.threads, *writer, progress);
+  writer->Finish();
+  for (const std::string& line : writer->warnings()) progress.Warn(line);
+}
+
+InfoCommand::InfoCommand(CLI::App& program)
+    : command_(program.add_subcommand("info", "Tell what saved work holds")) {
+  command_->add_option("PROJECT", project_, "The saved work")->required();
+  command_->add_flag("--json", json_, "As a JSON object");
+}
+
+void InfoCommand::Run() {
+  const host::Project project = host::LoadProject(project_);
+  std::string clip, trouble;
+  try {
+    clip = host::FindClip(project_, project);
+  } catch (const host::ProjectFailure& failure) {
+    trouble = failure.what();
+  }
+  const double rate =
+      static_cast<double>(HX_TICKS_PER_SECOND) / static_cast<double>(project.ticks_per_frame);
+  if (json_) {
+    nlohmann::ordered_json json;
+    json["clip"] = clip.empty() ? project.clip_path : clip;
+    json["fits"] = trouble.empty();
+    if (!trouble.empty()) json["trouble"] = trouble;
+    json["width"] = project.width;
+    json["height"] = project.height;
+    json["start_frame"] = project.start_frame;
+    json["frames"] = project.length;
+    json["rate"] = rate;
+    json["instance_bytes"] = project.effect.instance.size();
+    std::printf("%s\n", json.dump().c_str());
+    return;
+  }
+  std::printf("%s: %d frames of %dx%d from %d, %.6g a second, %zu bytes of results\n",
+              clip.empty() ? project.clip_path.c_str() : clip.c_str(), project.length,
+              project.width, project.height, project.start_frame, rate,
+              project.effect.instance.size());
+  std::printf("%s\n", trouble.empty() ? "the clip is the one that was analysed" : trouble.c_str());
+}
+
+TracksCommand::TracksCommand(CLI::App& program)
+    : command_(program.add_subcommand("tracks", "Write the tracks of saved work to a file")) {
+  command_->add_option("PROJECT", project_, "The saved work")->required();
+  command_->add_option("OUT", output_, "The track file, .trk")->required();
+}
+
+void TracksCommand::Run() {
+  ControlFlags controls;
+  controls.experimental = true;  // the button is one for experts
+  const std::unique_ptr<SteadyClip> clip = Open(project_, controls);
+  tesselui::InstallSaveDialog(
+      [this](const tesselui::SaveDialogRequest&) -> std::optional<std::string> { return output_; });
+  std::error_code error;
+  std::filesystem::remove(output_, error);
+  const host::CommandResult pressed =
+      clip->effect().Press(clip->effect().IndexOf(kSaveTracksButton));
+  tesselui::InstallSaveDialog({});
+  if (!pressed.ok()) throw SolveFailure(pressed.Line(output_));
+  if (!std::filesystem::exists(output_, error)) {
+    throw media::Failure(media::Failure::Side::output,
+                         output_ + ": not written; " + project_ + " may hold no tracks");
+  }
+}
+
+}  // namespace calmframe

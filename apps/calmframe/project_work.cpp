@@ -1,0 +1,42 @@
+#include "apps/calmframe/project_work.h"
+
+#include <filesystem>
+
+#include "host/timeline/source.h"
+
+namespace calmframe {
+
+void AddProjectFlag(CLI::App& command, std::string& project) {
+  command
+      .add_option("--project", project,
+                  "Take up saved work from this file, if it is there, and save to it")
+      ->type_name("FILE")
+      ->group("Output");
+}
+
+std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
+                                   const ControlFlags& controls) {
+  std::error_code error;
+  if (project.empty() || !std::filesystem::exists(project, error)) {
+    return std::make_unique<SteadyClip>(clip, controls);
+  }
+  const host::Project saved = host::LoadProject(project);
+  if (host::ContentOf(clip) != saved.clip_content) {
+    throw media::Failure(media::Failure::Side::input,
+                         project + ": is of another clip, " + saved.clip_path);
+  }
+  return std::make_unique<SteadyClip>(saved, clip, controls);
+}
+
+void WorkAndLeave(SteadyClip& clip, const std::string& project, ProgressLine& progress) {
+  const Reuse reuse = clip.Work(progress);
+  if (project.empty()) return;
+  if (const std::string text = reuse.Text(); !text.empty()) progress.Note(project + ": " + text);
+  try {
+    host::SaveProject(project, clip.Saved());
+  } catch (const host::ProjectFailure& failure) {
+    throw media::Failure(media::Failure::Side::output, failure.what());
+  }
+}
+
+}  // namespace calmframe
