@@ -82,6 +82,7 @@ std::string ProgressJson(const Progress& progress, double elapsed_seconds) {
     json["unit"] = progress.unit;
   }
   if (!progress.says.empty()) json["says"] = progress.says;
+  if (progress.ends) json["ended"] = true;
   json["elapsed"] = std::round(elapsed_seconds * 1000) / 1000;
   return json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
 }

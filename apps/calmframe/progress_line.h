@@ -42,8 +42,8 @@ class ProgressLine {
 // One line of a stage, without a newline: "rendering   42 %  126/300 frames  18.3 frames/s  0:09
 // left". What the effect says takes the place of the numbers that it tells.
 std::string ProgressText(const Progress& progress, double elapsed_seconds);
-// The same as a JSON object: "stage", "elapsed" in seconds, and what is known of "share" (0 to 1),
-// "done", "total", "unit", "says".
+// The same as a JSON object: "stage", "elapsed" in seconds, "ended" at its end, and what is known
+// of "share" (0 to 1), "done", "total", "unit", "says".
 std::string ProgressJson(const Progress& progress, double elapsed_seconds);
 
 // From now on the first Ctrl-C (or SIGTERM) asks the running stage to end; a second one ends the
