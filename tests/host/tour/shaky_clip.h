@@ -14,6 +14,7 @@ struct ShakyClip {
   std::int64_t frames = 24;
   std::string name = "shaky clip";
   double tremor = 1;                                     // times that of CameraX and CameraY
+  HX_Ratio aspect = {1, 1};                              // of a pixel
   std::function<void(std::int64_t frame)> on_draw = {};  // on the thread that draws, first
 };
 
@@ -51,6 +52,7 @@ inline SourcePtr MakeShakyClip(const ShakyClip& clip = {}) {
   SourceInfo info;
   info.width = clip.width;
   info.height = clip.height;
+  info.pixel_aspect = clip.aspect;
   info.frame_count = clip.frames;
   info.content = tessel::utility::Guid::FromText(clip.name);
   return MakeDrawnSource(info, [clip](std::int64_t frame, Picture& picture) {

@@ -19,8 +19,8 @@ const ShakyClip kClip{96, 64, 6, "short clip"};
 
 class TourFaults : public PlayedPlugin {
  protected:
-  // From the making of two effects to the end of one. The first code and message that are not in
-  // order must be ones that a user can do something with.
+  // From the making of two effects to the end of one. A command that fails says why, by a code of
+  // its own or by a message.
   void Play() {
     const auto expect_clear = [](const CommandResult& result) {
       static const std::set<HX_Err> kClear = {HX_ERR_NONE,        kFaultCode,

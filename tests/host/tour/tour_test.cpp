@@ -1,7 +1,9 @@
+#include <algorithm>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "platform/tessel/debug.h"
 #include "tests/host/tour/held_work.h"
 #include "tests/host/tour/played_plugin.h"
 
@@ -20,7 +22,9 @@ class Tour : public PlayedPlugin {
 };
 
 TEST_F(Tour, AppliedItAnalysesSolvesAndSteadies) {
-  EXPECT_EQ(host().declarations().size(), 31u);
+  // What a debug option shows beside is run by a test of its own.
+  EXPECT_EQ(host().declarations().size(),
+            tessel::debug::DebugDatabase::GetBool("ShowExperimentalEffectParameters") ? 98u : 31u);
   EXPECT_EQ(host().About().message,
             "Calmframe, v1.0\n\nStabilizes footage without manual tracking.");
   Effect& effect = session().Apply(MakeLayer());
@@ -60,6 +64,9 @@ TEST_F(Tour, PathsDepthsAndPartsAgree) {
   for (int framing = 1; framing <= 4; ++framing) {
     effect.SetParam(kFraming, framing);
     ASSERT_EQ(Settle(effect), 8) << framing;
+    EXPECT_EQ(host().library().exports().allow_cuda_rendering(
+                  host().opaque_data().Peek(effect.shared()->reference())),
+              framing != 4);
     for (const std::uint32_t den : {1u, 2u}) {
       const HX_Ratio ratio{1, den};
       const RenderedFrame reference = renderer->Planned({7, 32, ratio});
@@ -174,6 +181,79 @@ TEST_F(Tour, DetailedAnalysisStartsAnalysisAtOnce) {
   session().Tick();
   EXPECT_EQ(Session::WorkOf(effect), Session::Work::analysing);
   EXPECT_EQ(Settle(effect), 8);
+}
+
+TEST_F(Tour, ClipsOfAnyKindComeToAnEnd) {
+  const struct {
+    const char* name;
+    std::int64_t frames;
+    std::int32_t start, field_type;
+    HX_Ratio aspect;
+  } clips[] = {{"one frame", 1, 0, HX_FIELD_PROGRESSIVE, {1, 1}},
+               {"two frames", 2, 0, HX_FIELD_PROGRESSIVE, {1, 1}},
+               {"upper field first", 12, 0, 1, {1, 1}},
+               {"lower field first", 12, 2, 2, {1, 1}},
+               {"before its media", 20, -3, HX_FIELD_PROGRESSIVE, {1, 1}},
+               {"anamorphic", 20, 0, HX_FIELD_PROGRESSIVE, {16, 15}}};
+  for (const auto& clip : clips) {
+    SCOPED_TRACE(clip.name);
+    ShakyClip shaky{160, 120, clip.frames, clip.name};
+    shaky.aspect = clip.aspect;
+    const auto layer = MakeLayer(shaky);
+    layer->Change([&](LayerState& state) {
+      state.start_frame = clip.start;
+      state.field_type = clip.field_type;
+      state.length = static_cast<std::int32_t>(clip.frames) - std::max(clip.start, 0);
+    });
+    Effect& effect = session().Apply(layer);
+    effect.SetParam(kFraming, 1);
+    EXPECT_EQ(Settle(effect), 8);
+    EXPECT_TRUE(effect.TakeMessages().empty());
+    const bool fields = clip.field_type != HX_FIELD_PROGRESSIVE;
+    std::int32_t rows = 0, first = 0, other[6];
+    float bounds[4];
+    EXPECT_TRUE(host().library().exports().get_stabilizer_data(
+        host().opaque_data().Peek(effect.shared()->reference()), &rows, &first, &other[0],
+        &other[1], &other[2], &other[3], &bounds[0], &bounds[1], &bounds[2], &bounds[3], &other[4],
+        &other[5]));
+    EXPECT_EQ(rows, (fields ? 2 : 1) * layer->state()->length);
+    EXPECT_EQ(first, (fields ? 2 : 1) * std::max(clip.start, 0));
+    const auto renderer = effect.MakeRenderer();
+    for (const bool second : {false, true}) {
+      RenderRequest request{std::max<std::int64_t>(-clip.start, 0)};
+      request.second_field = second && fields;
+      EXPECT_TRUE(renderer->Planned(request).pixels);
+      EXPECT_TRUE(renderer->Direct(request).pixels);
+    }
+    session().Remove(effect);
+  }
+}
+
+TEST_F(Tour, ASourceOfAnotherSizeIsToldOnceAndAnalysedAnew) {
+  const auto layer = MakeLayer();
+  Effect& effect = session().Apply(layer);
+  ASSERT_EQ(Settle(effect), 8);
+  const auto renderer = effect.MakeRenderer();
+  layer->Resize(160, 120);
+  for (int i = 0; i < 3; ++i) session().Tick();
+  const std::vector<std::string> messages = effect.TakeMessages();
+  ASSERT_EQ(messages.size(), 1u);
+  EXPECT_NE(messages[0].find("from 320x240 to 160x120"), std::string::npos) << messages[0];
+  EXPECT_TRUE(renderer->Planned({7}).pixels);
+  EXPECT_TRUE(Enabled(effect, kAnalyze));
+  layer->Resize(1, 1);
+  EXPECT_TRUE(effect.Press(kAnalyze).ok());
+  for (int i = 0; i < 3; ++i) session().Tick();
+  for (const bool direct : {true, false}) {
+    const RenderedFrame frame = direct ? renderer->Direct({7}) : renderer->Planned({7});
+    ASSERT_TRUE(frame.pixels);
+    EXPECT_EQ(Difference(*frame.pixels, *SourceFrame(effect, 7)), 0);
+  }
+  layer->Resize(160, 120);
+  EXPECT_TRUE(effect.Press(kAnalyze).ok());
+  EXPECT_EQ(Settle(effect), 8);
+  EXPECT_TRUE(renderer->Planned({7}).pixels);
+  EXPECT_TRUE(effect.TakeMessages().empty());
 }
 
 TEST_F(Tour, ALayerOfOnePixelDoesNothing) {
