@@ -151,6 +151,7 @@ TEST(StoredServiceTest, AnAnalysisThatHasNotBegunBeginsAfterTheReload) {
 
   // One whose job is not of this process is gone, and the host hears of it.
   test.state()->analyzer->set_job_stage(analysis::JobStage::SeenRunning);
+  test.Set(kAnalysisStatusCounterIndex, 204);
   FlattenAndRestore(test);
   EXPECT_FALSE(test.state()->analyzer);
   EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::PressAnalyze);
@@ -225,6 +226,7 @@ TEST(StoredServiceTest, WhatCannotBeReadBecomesAnEmptyStateAndAMessage) {
   for (const auto& c : cases) {
     StabilizerHost test;
     test.host.in.width = c.width;
+    test.Set(kAnalysisStatusCounterIndex, 508);
     Restore(test, c.bytes);
     EXPECT_TRUE(test.host.ShowsMessage());
     EXPECT_EQ(std::string(test.host.out.return_msg), c.message);

@@ -1,8 +1,10 @@
+#include <cmath>
 #include <cstring>
 #include <memory>
 #include <string>
 #include <utility>
 
+#include "analysis/effect/analysis_parameter_rows.h"
 #include "analysis/host/video_segment_render_suite_job.h"
 #include "analysis/src/state_errors.h"
 #include "effect/host_requests.h"
@@ -102,10 +104,21 @@ void KeepJobThatCanGoOn(StabilizerState& state) {
   }
   state.analyzer.reset();
   state.analysis_pending = false;
-  if (!state.has_frames()) state.unpublished = FrameStatus::PressAnalyze;
 }
 
 }  // namespace
+
+// The project's parameters tell what was under way, or could not be told, when it was saved.
+FrameStatus StabilizerEffect::UntoldStatus(const StabilizerState& state) {
+  if (state.analyzer || (state.has_frames() && state.needs_solve)) return FrameStatus::None;
+  const FrameStatus status = !state.has_frames()                 ? FrameStatus::PressAnalyze
+                             : state.phase == SolvePhase::Failed ? FrameStatus::SolveFailed
+                                                                 : FrameStatus::Ready;
+  const double counter = GetFloatParam(analysis::effect::kAnalysisStatusCounterParam);
+  const auto told = static_cast<FrameStatus>(std::llround(std::fmod(counter, 100)));
+  const bool idle = status == FrameStatus::PressAnalyze && told == FrameStatus::None;
+  return told == status || idle ? FrameStatus::None : status;
+}
 
 void StabilizerEffect::FlattenInstance() {
   HX_InData& in = *context().in;
@@ -145,9 +158,9 @@ void StabilizerEffect::ReloadInstance() {
       LoadInstance(context(), kind, *state);
     } catch (const analysis::StateDeserializationFailed&) {
       state = std::make_unique<StabilizerState>(in, false);
-      state->unpublished = FrameStatus::PressAnalyze;
     }
     KeepJobThatCanGoOn(*state);
+    state->unpublished = UntoldStatus(*state);
   }
   OwnedHandle live(*in.cb, AllocateInstanceHandle(kLivePayloadLength));
   InstanceHandleLock(context(), live.get())->state = state.release();
