@@ -58,7 +58,7 @@ class RenderAhead {
       : clip_(clip),
         depth_(depth),
         count_(static_cast<std::int64_t>(clip.info().frame_count)),
-        window_(2 * threads) {
+        window_(threads + 2) {
     for (int i = 0; i < threads; ++i) threads_.emplace_back([this] { RenderFrames(); });
   }
   ~RenderAhead() {

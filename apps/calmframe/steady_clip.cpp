@@ -35,7 +35,7 @@ host::HostSettings SettingsFor(const media::ClipInfo& info, const ControlFlags& 
   ShowExperimentalParameters(controls);
   host::HostSettings settings;
   // A walk from the first frame to the last needs what is ahead of it and little more.
-  constexpr std::size_t kFrames = 16;
+  constexpr std::size_t kFrames = 6;
   settings.media.cache_bytes =
       kFrames * static_cast<std::size_t>(info.width) * static_cast<std::size_t>(info.height) * 4;
   return settings;

@@ -23,13 +23,15 @@ HX_Err Operations::Begin(const char* name) {
 HX_Err Operations::BeginWatched(const char* name) {
   std::lock_guard lock(mutex_);
   if (recording_) recorded_.push_back(name);
-  const bool nth = fail_in_ > 0 && --fail_in_ == 0;
+  const bool counts = fail_in_ > 0 && (fail_name_.empty() || fail_name_ == name);
+  const bool nth = counts && --fail_in_ == 0;
   return nth || fail_always_.count(name) != 0 ? kFaultCode : HX_ERR_NONE;
 }
 
-void Operations::FailNth(std::int64_t n) {
+void Operations::FailNth(std::int64_t n, const std::string& name) {
   std::lock_guard lock(mutex_);
   fail_in_ = n;
+  fail_name_ = name;
   watched_ = recording_ || fail_in_ > 0 || !fail_always_.empty();
 }
 

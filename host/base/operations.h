@@ -30,8 +30,8 @@ class Operations {
   HX_Err Begin(const char* name);
 
   // -- Fault switches --
-  // The n-th operation from now on, counted from 1, fails; 0: none.
-  void FailNth(std::int64_t n);
+  // The n-th operation from now on, counted from 1, fails; 0: none. With a name, the n-th of those.
+  void FailNth(std::int64_t n, const std::string& name = {});
   // Every operation of that name fails from now on.
   void FailAlways(const std::string& name);
   void FailNone();
@@ -51,6 +51,7 @@ class Operations {
   mutable std::mutex mutex_;
   bool recording_ = false;             // guarded by mutex_
   std::int64_t fail_in_ = 0;           // guarded by mutex_
+  std::string fail_name_;              // guarded by mutex_; empty: any
   std::set<std::string> fail_always_;  // guarded by mutex_
   std::vector<std::string> recorded_;  // guarded by mutex_
 };

@@ -50,7 +50,7 @@ constexpr HX_ParamUtilsSuite3 kParamUtils = {UpdateParamUI, SetParamValue};
 template <typename Value, typename Get>
 HX_Err Tell(const char* operation, HX_EffectRef effect, Value* value, Get get) {
   return WithInstance(operation, effect, [&](Host&, Instance& instance) -> HX_Err {
-    *value = get(*instance.effect(), *instance.effect()->layer()->state());
+    *value = get(*instance.effect(), *instance.layer());
     return HX_ERR_NONE;
   });
 }
@@ -59,7 +59,7 @@ template <typename Get>
 HX_Err TellText(const char* operation, HX_EffectRef effect, std::uint16_t* text, std::uint32_t max,
                 Get get) {
   return WithInstance(operation, effect, [&](Host& host, Instance& instance) -> HX_Err {
-    CopyUTF16(get(host, *instance.effect()->layer()->state()), text, max);
+    CopyUTF16(get(host, *instance.layer()), text, max);
     return HX_ERR_NONE;
   });
 }

@@ -76,7 +76,9 @@ CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World
   HX_OutData answered{};
   if (!out) out = &answered;
   frames_ = frames;
+  SetLayerOfCall(frames->shared_layer());
   const CommandResult result = host_.Command(command, in, *out, pointers.data(), output, extra);
+  SetLayerOfCall(nullptr);
   frames_ = nullptr;
   handle_ = out->instance_handle;
   for (std::size_t i = 1; i < params.size(); ++i) {
@@ -86,6 +88,19 @@ CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World
   }
   if (!result.message.empty()) effect_->AddMessage(result.message);
   return result;
+}
+
+void Instance::SetLayerOfCall(boost::shared_ptr<const LayerState> layer) {
+  std::lock_guard lock(mutex_);
+  layer_of_call_ = std::move(layer);
+}
+
+boost::shared_ptr<const LayerState> Instance::layer() const {
+  {
+    std::lock_guard lock(mutex_);
+    if (layer_of_call_) return layer_of_call_;
+  }
+  return effect_->layer()->state();
 }
 
 std::optional<HX_ParamDef> Instance::Param(std::int32_t index) const {

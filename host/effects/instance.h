@@ -1,7 +1,9 @@
 #pragma once
 
+#include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 
@@ -64,15 +66,22 @@ class Instance {
   std::optional<HX_ParamDef> Param(std::int32_t index) const;
   // Of the call that is under way, for the interface's functions; null outside.
   RenderContext* frames() const { return frames_; }
+  // The layer as the call that is under way sees it, so that both commands of a render see one;
+  // outside of calls as it is now. Any thread.
+  boost::shared_ptr<const LayerState> layer() const;
 
  private:
   Instance(Host& host, std::shared_ptr<TimelineEffect> effect);
+
+  void SetLayerOfCall(boost::shared_ptr<const LayerState> layer);
 
   Host& host_;
   const std::shared_ptr<TimelineEffect> effect_;
   HX_EffectRef ref_ = nullptr;  // constant after Make
   HX_Handle handle_ = nullptr;
   RenderContext* frames_ = nullptr;
+  mutable std::mutex mutex_;
+  boost::shared_ptr<const LayerState> layer_of_call_;  // guarded by mutex_; null outside of calls
 };
 
 }  // namespace calmframe::host

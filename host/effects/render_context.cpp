@@ -63,6 +63,7 @@ PicturePtr RenderContext::Fetch(std::int64_t media_ticks) {
   request.kind = KindOfDepth(bit_depth_);
   request.width = width_;
   request.height = height_;
+  request.layer = layer_;
   return media_.Input(effect_, request);
 }
 

@@ -33,6 +33,7 @@ class RenderContext {
   const std::vector<HX_ParamDef>& frozen_params() const { return params_; }  // empty: none
 
   const LayerState& layer() const { return *layer_; }
+  const boost::shared_ptr<const LayerState>& shared_layer() const { return layer_; }
   int bit_depth() const { return bit_depth_; }
   HX_Ratio downsample_x() const { return downsample_x_; }
   HX_Ratio downsample_y() const { return downsample_y_; }

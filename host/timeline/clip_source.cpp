@@ -35,22 +35,6 @@ constexpr std::streamoff kHashedBytes = 64 << 10;
   throw media::Failure(media::Failure::Side::input, path + ": cannot be read");
 }
 
-Guid ContentOf(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  file.seekg(0, std::ios::end);
-  const std::int64_t size = file.tellg();
-  if (!file) Unreadable(path);
-  Guid guid = MixHash(Guid(), &size, sizeof size);
-  std::array<char, kHashedBytes> bytes;
-  const std::streamoff part = std::min<std::int64_t>(size, kHashedBytes);
-  for (const std::streamoff start : {std::streamoff{0}, size - part}) {
-    file.seekg(start);
-    if (!file.read(bytes.data(), part)) Unreadable(path);
-    guid = MixHash(guid, bytes.data(), static_cast<std::size_t>(part));
-  }
-  return guid;
-}
-
 std::int64_t TicksPerFrame(const media::Ratio& rate) {
   if (rate.num <= 0 || rate.den <= 0) return SourceInfo{}.ticks_per_frame;
   const __int128 twice = (__int128{HX_TICKS_PER_SECOND} * rate.den * 2) / rate.num;
@@ -179,6 +163,22 @@ class ClipSource final : public Source {
 };
 
 }  // namespace
+
+Guid ContentOf(const std::string& path) {
+  std::ifstream file(path, std::ios::binary);
+  file.seekg(0, std::ios::end);
+  const std::int64_t size = file.tellg();
+  if (!file) Unreadable(path);
+  Guid guid = MixHash(Guid(), &size, sizeof size);
+  std::array<char, kHashedBytes> bytes;
+  const std::streamoff part = std::min<std::int64_t>(size, kHashedBytes);
+  for (const std::streamoff start : {std::streamoff{0}, size - part}) {
+    file.seekg(start);
+    if (!file.read(bytes.data(), part)) Unreadable(path);
+    guid = MixHash(guid, bytes.data(), static_cast<std::size_t>(part));
+  }
+  return guid;
+}
 
 SourcePtr OpenClip(const std::string& path) {
   return boost::make_shared<ClipSource>(path);

@@ -95,7 +95,8 @@ void MediaServices::DetachEffect(HX_EffectRef effect) {
 PicturePtr MediaServices::Input(HX_EffectRef effect, const InputRequest& request) {
   const auto attached = core_->Find(effect);
   if (!attached) return nullptr;
-  const boost::shared_ptr<const LayerState> layer = attached->layer->state();
+  const boost::shared_ptr<const LayerState> layer =
+      request.layer ? request.layer : attached->layer->state();
   const std::optional<GraphNode> node = InputOf(layer, attached->runtime_id);
   if (!node) return nullptr;
   const SourceInfo& info = layer->source->info();

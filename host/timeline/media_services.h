@@ -51,6 +51,7 @@ struct InputRequest {
   PixelKind kind = PixelKind::argb8;
   int width = 0, height = 0;  // 0: the source's
   bool single_field = true;   // of an interlaced layer the one field of the time, at full height
+  boost::shared_ptr<const LayerState> layer = {};  // as it stood; null: as it stands
 };
 
 class MediaCore;  // what the operations of the suites work on

@@ -1,8 +1,11 @@
 #include "stabilization/cp_warper.h"
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <utility>
+#include <vector>
 
 #include "tests/stabilization/warper_clips.h"
 
@@ -184,6 +187,59 @@ TEST(CPWarperTest, AWildHomographyIsLimitedToASimilarityFromSixTracksOn) {
   };
   EXPECT_EQ(scores(5), 4);
   EXPECT_EQ(scores(6), 2);
+}
+
+TEST(CPWarperTest, AFrameWhoseTracksDisagreeBecomesASimilarityAndItsNeighboursRampToIt) {
+  // Two rings of four corners, moved to and fro along x in turn: the best similarity is the
+  // identity and leaves every track `apart` away.
+  const auto scores = [](double apart) {
+    auto global = boost::make_shared<stabilizer_global>(empty_clip(8, 120));
+    for (int s = 0; s < 8; ++s) {
+      const double ring = s < 4 ? 400 : 200, right = s & 1 ? 1 : -1, low = s & 2 ? 1 : -1;
+      add_track(
+          *global, s, 0, 120,
+          [&](int) {
+            return point2{960 + ring * right, 540 + ring * low};
+          },
+          [&](int f, point2 p) {
+            return point2{p.x + (f == 50 ? apart * right * low : 0), p.y};
+          });
+    }
+    SolverParamsRecord parameters;
+    parameters.homography_limit = 1e9f;
+    CPWarper warper(120, kWidth, kHeight);
+    warper.buildDisplacements(global, whole_clip(120), {}, parameters, [] {});
+    std::vector<double> found;
+    for (const int f : {50, 51, 36, 35, 65, 20, 19}) found.push_back(warper.modelScore(f));
+    return found;
+  };
+  // 0.15 of the frame's width is 288.
+  EXPECT_EQ(scores(287), std::vector<double>(7, 4.0));
+  EXPECT_THAT(scores(289),
+              testing::Pointwise(testing::DoubleNear(1e-12),
+                                 {2.0, 2 + 1.0 / 15, 2 + 14.0 / 15, 3.0, 3.0, 4.0, 4.0}));
+}
+
+TEST(CPWarperTest, AnOutlierWeighsItsTrackDownForSixtyFrames) {
+  auto global = boost::make_shared<stabilizer_global>(empty_clip(20, 200));
+  for (int s = 0; s < 20; ++s) {
+    add_track(
+        *global, s, 0, 200,
+        [&](int) {
+          return point2{100.0 + 80 * s, 100.0 + 311 * s % 800};
+        },
+        [&](int f, point2 p) {
+          return point2{p.x + 5 + (s == 7 && f == 100 ? 60 : 0), p.y};
+        });
+  }
+  const auto warper = built(global, 4);
+  const std::pair<int, double> expected[] = {{100, 0.0},       {99, 1.0 / 60}, {101, 1.0 / 60},
+                                             {70, 0.5},        {130, 0.5},     {41, 59.0 / 60},
+                                             {159, 59.0 / 60}, {40, 1.0},      {160, 1.0}};
+  for (const auto& [frame, weight] : expected) {
+    EXPECT_NEAR(warper->displacements(frame)[7].weight, weight, 1e-12) << "frame " << frame;
+    EXPECT_EQ(warper->displacements(frame)[8].weight, 1.0);
+  }
 }
 
 TEST(CPWarperTest, AFrameWithoutTracksHasNoPlace) {

@@ -37,6 +37,8 @@ class Stages {
     text_.clear();
     return stages;
   }
+  // While it lives, a solve waits at its next stage.
+  std::unique_lock<std::mutex> Hold() { return std::unique_lock<std::mutex>(mutex_); }
 
  private:
   std::mutex mutex_;
@@ -62,11 +64,13 @@ class SolveServiceTest : public ::testing::Test {
 
 TEST_F(SolveServiceTest, TheFirstSolveIsToldFromItsBeginningToItsEnd) {
   StabilizerState& state = test.Analysed(ShakenTable(20, 40));
+  auto hold = stages.Hold();
   ASSERT_EQ(test.Tick(), HX_ERR_NONE);
   ASSERT_TRUE(state.solver);
   EXPECT_EQ(test.Status(), 5);
   EXPECT_TRUE(test.Effect().IsBusy());
   const int rerenders = test.host.rerenders();
+  hold.unlock();
   state.solver->Wait();
   EXPECT_GT(test.host.rerenders(), rerenders) << "the solve brings the host back";
   ASSERT_EQ(test.Tick(), HX_ERR_NONE);

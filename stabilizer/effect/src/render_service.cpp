@@ -129,11 +129,6 @@ void StabilizerEffect::PrepareFrame() {
 
 // -- The planned path --
 
-std::int32_t StabilizerEffect::InputId() {
-  const CurrentFrame current = GetCurrentFrame(true);
-  return current.valid ? static_cast<std::int32_t>(current.frame) : 0;
-}
-
 std::int64_t StabilizerEffect::PlanMargin(const StabilizerState& state) {
   const EffectParameters params(*this);
   const std::int64_t deblur =
@@ -156,12 +151,12 @@ void StabilizerEffect::PlanFrame() {
   const HX_InData& in = *context().in;
   plan.solid = plan.may_exceed = 0;
   HX_CheckoutResult input{};
-  const auto order_input = [&](const HX_RenderRequest& request) {
-    ThrowIfFailed(plan.checkout_layer(in.effect_ref, 0, InputId(), &request, in.current_time,
-                                      in.time_step, in.time_scale, &input));
+  const auto order_input = [&](std::int32_t id, const HX_RenderRequest& request) {
+    ThrowIfFailed(plan.checkout_layer(in.effect_ref, 0, id, &request, in.current_time, in.time_step,
+                                      in.time_scale, &input));
   };
   if (IsOneByOne()) {
-    order_input(plan.request);
+    order_input(0, plan.request);
     plan.result_rect = input.result_rect;
     plan.full_rect = input.full_rect;
     return;
@@ -174,7 +169,9 @@ void StabilizerEffect::PlanFrame() {
   const OutputRect layer = InputRect(in);
   const HX_RenderRequest whole{{0, 0, layer.width, layer.height}, plan.request.bit_depth};
   const CurrentFrame current = GetCurrentFrame(true);
-  if (current.valid && IsRenderableFrame()) {
+  state.planned_input = current.valid ? static_cast<std::int32_t>(current.frame) : 0;
+  state.planned_warp = current.valid && IsRenderableFrame();
+  if (state.planned_warp) {
     const FrameClock clock = ClockOf(state);
     const std::int64_t margin = PlanMargin(state);
     const std::int64_t first =
@@ -188,7 +185,7 @@ void StabilizerEffect::PlanFrame() {
                                         at.time, at.step, at.scale, &input));
     }
   } else {
-    order_input(whole);
+    order_input(state.planned_input, whole);
   }
 
   const OutputRect output = SetUpOutput();
@@ -209,8 +206,9 @@ void StabilizerEffect::RenderPlannedFrame() {
   if (depth != 8 && depth != 16 && depth != 32) return;
   HX_World* output = nullptr;
   ThrowIfFailed(extra.checkout_output(context().in->effect_ref, &output));
-  PlannedFrames frames(context(), InputId());
-  Render(frames, *output, depth);
+  const StabilizerState* const state = GetState();
+  PlannedFrames frames(context(), state && !IsOneByOne() ? state->planned_input : 0);
+  Render(frames, *output, depth, state && state->planned_warp);
 }
 
 // -- The direct path --
@@ -219,17 +217,18 @@ void StabilizerEffect::RenderFrame() {
   if (!context().output) return;
   const DirectRender render(context());
   DirectFrames frames(context(), [this] { return ClockOf(*GetState()); });
-  Render(frames, *context().output, context().output->flags & HX_WORLD_DEEP ? 16 : 8);
+  Render(frames, *context().output, context().output->flags & HX_WORLD_DEEP ? 16 : 8, true);
 }
 
 // -- What both draw --
 
-void StabilizerEffect::Render(RenderFrames& frames, HX_World& output, std::int32_t depth) {
+void StabilizerEffect::Render(RenderFrames& frames, HX_World& output, std::int32_t depth,
+                              bool may_warp) {
   const auto pass_through = [&] { CopyInput(context(), *frames.Input(), output, depth); };
   if (IsOneByOne() || ShowsOverlay()) return pass_through();
   const StatusRecord record = GetStatusRecord();
   bool stabilized = false;
-  if (IsRenderableFrame()) {
+  if (may_warp && IsRenderableFrame()) {
     ForDepth(depth,
              [&](auto pixel) { stabilized = RenderStabilized<decltype(pixel)>(frames, output); });
   }
@@ -241,8 +240,9 @@ void StabilizerEffect::Render(RenderFrames& frames, HX_World& output, std::int32
 template <class Pixel>
 bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) {
   const StabilizerState& state = *GetState();
-  const std::int64_t row = GetCurrentFrame(true).frame - state.first_frame;
-  if (!state.warper || row < 0) return false;
+  const CurrentFrame current = GetCurrentFrame(true);
+  const std::int64_t row = current.frame - state.first_frame;
+  if (!state.warper || !current.valid || row < 0) return false;
   const auto frame = static_cast<std::size_t>(row);
   if (frame >= state.warper->frameWarpCount()) return false;
 

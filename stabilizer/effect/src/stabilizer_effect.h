@@ -86,12 +86,11 @@ class StabilizerEffect final : public analysis::effect::AnalysisEffect {
   // The output of a render of the whole frame: that of the layer unless the frame can be rendered
   // and may reach beyond it.
   OutputRect SetUpOutput();
-  // The id under which a plan orders the frame of its own time.
-  std::int32_t InputId();
   // Frames on either side of the current one that a plan orders.
   std::int64_t PlanMargin(const StabilizerState& state);
   FrameClock ClockOf(const StabilizerState& state);
-  void Render(RenderFrames& frames, HX_World& output, std::int32_t depth);
+  // Without may_warp, and where the frame can't be rendered, the input is drawn.
+  void Render(RenderFrames& frames, HX_World& output, std::int32_t depth, bool may_warp);
   template <class Pixel>
   bool RenderStabilized(RenderFrames& frames, HX_World& output);
   void SendPolygon(const StabilizerState& state, std::size_t frame, const Renderer& renderer,

@@ -4,7 +4,6 @@
 #include <string>
 #include <utility>
 
-#include "analysis/effect/analysis_parameter_rows.h"
 #include "analysis/host/video_segment_render_suite_job.h"
 #include "analysis/src/state_errors.h"
 #include "effect/host_requests.h"
@@ -12,6 +11,7 @@
 #include "platform/tessel/debug.h"
 #include "platform/tessel/filesupport.h"
 #include "stabilizer/effect/src/instance_handle.h"
+#include "stabilizer/effect/src/parameter_table.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
 #include "stabilizer/effect/src/state_format/state_reader.h"
@@ -88,8 +88,7 @@ void LoadInstance(const HostContext& context, FlattenedInstance kind, Stabilizer
       Refuse(context, kBadSerializedData);
   }
   try {
-    state.Load(ReadPayload(context, context.in->instance_handle),
-               MakeVideoSegmentRenderSuiteJob);
+    state.Load(ReadPayload(context, context.in->instance_handle), MakeVideoSegmentRenderSuiteJob);
   } catch (const StateRefused& refused) {
     Refuse(context, refused);
   }
@@ -114,7 +113,7 @@ FrameStatus StabilizerEffect::UntoldStatus(const StabilizerState& state) {
   const FrameStatus status = !state.has_frames()                 ? FrameStatus::PressAnalyze
                              : state.phase == SolvePhase::Failed ? FrameStatus::SolveFailed
                                                                  : FrameStatus::Ready;
-  const double counter = GetFloatParam(analysis::effect::kAnalysisStatusCounterParam);
+  const double counter = GetFloatParam(kAnalysisStatusCounterIndex);
   const auto told = static_cast<FrameStatus>(std::llround(std::fmod(counter, 100)));
   const bool idle = status == FrameStatus::PressAnalyze && told == FrameStatus::None;
   return told == status || idle ? FrameStatus::None : status;
@@ -167,6 +166,8 @@ void StabilizerEffect::ReloadInstance() {
   in.instance_handle = context().out->instance_handle = live.release();
   in.cb->dispose_handle(stored);
   AttachSharedData(false);
+  const StabilizerState* const present = GetState();
+  if (present && present->unpublished != FrameStatus::None) PublishStatus(present->unpublished);
   ForceRerender(context());
 }
 

@@ -25,6 +25,7 @@ enum : std::int32_t {
   kAutoScale = 10,
   kMaximumScale = 11,
   kDetailedAnalysis = 17,
+  kCropLessSmoothMore = 19,
   kHideBanner = 28
 };
 
@@ -32,7 +33,7 @@ enum : std::int32_t {
 class PlayedPlugin : public testing::Test {
  protected:
   PlayedPlugin()
-      : host_(std::make_unique<Host>(CALMFRAME_PLUGIN)),
+      : host_(std::make_unique<Host>(CALMFRAME_PLUGIN, Settings())),
         session_(std::make_unique<Session>(*host_)) {
     host_->handles().MoveOnUnlock(true);
     host_->worlds().SetRowPadding(16);
@@ -57,6 +58,13 @@ class PlayedPlugin : public testing::Test {
 
   static bool Enabled(const Effect& effect, std::int32_t index) {
     return !(effect.Param(index)->ui_flags & HX_PARAM_UI_DISABLED);
+  }
+
+  // A cache that the clips of a tour outgrow.
+  static HostSettings Settings() {
+    HostSettings settings;
+    settings.media.cache_bytes = std::size_t{16} << 20;
+    return settings;
   }
 
   Host& host() { return *host_; }

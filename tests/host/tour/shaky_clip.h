@@ -2,6 +2,8 @@
 
 #include <cmath>
 #include <cstdint>
+#include <functional>
+#include <string>
 
 #include "host/timeline/source.h"
 
@@ -10,7 +12,9 @@ namespace calmframe::host {
 struct ShakyClip {
   int width = 320, height = 240;
   std::int64_t frames = 24;
-  const char* name = "shaky clip";
+  std::string name = "shaky clip";
+  double tremor = 1;                                     // times that of CameraX and CameraY
+  std::function<void(std::int64_t frame)> on_draw = {};  // on the thread that draws, first
 };
 
 // Where the camera of a shaky clip looks in a frame, in pixels: a pan with a tremor.
@@ -49,8 +53,9 @@ inline SourcePtr MakeShakyClip(const ShakyClip& clip = {}) {
   info.height = clip.height;
   info.frame_count = clip.frames;
   info.content = tessel::utility::Guid::FromText(clip.name);
-  return MakeDrawnSource(info, [](std::int64_t frame, Picture& picture) {
-    const double dx = CameraX(frame), dy = CameraY(frame);
+  return MakeDrawnSource(info, [clip](std::int64_t frame, Picture& picture) {
+    if (clip.on_draw) clip.on_draw(frame);
+    const double dx = clip.tremor * CameraX(frame), dy = clip.tremor * CameraY(frame);
     FillPicture(picture, [=](int x, int y) {
       const auto value = static_cast<float>(Noise(x + dx, y + dy));
       return HX_PixelFloat{1.0f, value, value * 0.8f, 1.0f - value};

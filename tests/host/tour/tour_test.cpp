@@ -1,6 +1,8 @@
 #include <string>
+#include <utility>
 #include <vector>
 
+#include "tests/host/tour/held_work.h"
 #include "tests/host/tour/played_plugin.h"
 
 // The real plug-in, played by the host as any plug-in is.
@@ -88,45 +90,24 @@ TEST_F(Tour, PathsDepthsAndPartsAgree) {
 }
 
 TEST_F(Tour, SmoothnessSolvesAgainAndMaximumScaleOnlyFrames) {
+  SolveStages stages;
   Effect& effect = session().Apply(MakeLayer());
   ASSERT_EQ(Settle(effect), 8);
+  EXPECT_EQ(stages.Take(), "factorization crop ");
   const void* warp = WarpOf(effect, 5);
   ASSERT_TRUE(warp);
-  effect.SetParam(kMaximumScale, 101);
-  const int tight = Settle(effect);
-  EXPECT_TRUE(tight == 8 || tight == 12) << tight;
-  EXPECT_EQ(WarpOf(effect, 5), warp);
-  effect.SetParam(kMaximumScale, 150);
-  ASSERT_EQ(Settle(effect), 8);
-  EXPECT_EQ(WarpOf(effect, 5), warp);
-  effect.SetParam(kFraming, 2);
-  ASSERT_EQ(Settle(effect), 8);
-  EXPECT_EQ(WarpOf(effect, 5), warp);
+  const std::pair<std::int32_t, double> framings[] = {
+      {kMaximumScale, 101}, {kMaximumScale, 150}, {kFraming, 2}, {kCropLessSmoothMore, 100}};
+  for (const auto& [index, value] : framings) {
+    effect.SetParam(index, value);
+    ASSERT_EQ(Settle(effect), 8) << index << " " << value;
+    EXPECT_EQ(stages.Take(), "crop ") << index << " " << value;
+    EXPECT_EQ(WarpOf(effect, 5), warp) << index << " " << value;
+  }
   effect.SetParam(kSmoothness, 10);
   ASSERT_EQ(Settle(effect), 8);
+  EXPECT_EQ(stages.Take(), "factorization crop ");
   EXPECT_NE(WarpOf(effect, 5), warp);
-}
-
-TEST_F(Tour, CancelledAnywhereItStartsAnew) {
-  Effect& effect = session().Apply(MakeLayer());
-  int cancelled = 0;
-  for (int ticks = 1; ticks <= 10; ++ticks) {
-    for (int i = 0; i < ticks; ++i) {
-      session().Tick();
-      std::this_thread::sleep_for(std::chrono::milliseconds(3));
-    }
-    if (Enabled(effect, kCancel)) {
-      ASSERT_TRUE(effect.Press(kCancel).ok());
-      ++cancelled;
-      EXPECT_EQ(Settle(effect), 1);
-      EXPECT_TRUE(Enabled(effect, kAnalyze));
-    }
-    if (Enabled(effect, kAnalyze)) {
-      ASSERT_TRUE(effect.Press(kAnalyze).ok());
-    }
-  }
-  EXPECT_GT(cancelled, 0);
-  EXPECT_EQ(Settle(effect), 8);
 }
 
 // In front of the analysed range stands the source below a banner; behind it the last frame

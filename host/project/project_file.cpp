@@ -1,0 +1,274 @@
+#include "host/project/project_file.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <functional>
+#include <type_traits>
+#include <vector>
+
+#include "host/project/sqlite.h"
+#include "host/timeline/source.h"
+
+namespace calmframe::host {
+namespace {
+
+namespace fs = std::filesystem;
+using tessel::utility::Guid;
+
+constexpr std::int64_t kApplicationId = 0x43616c6d;  // "Calm", in the database's header
+constexpr std::int64_t kVersion = 1;
+
+constexpr char kChecksum[] = "checksum";
+constexpr char kCreate[] =
+    "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
+    "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
+    "CREATE TABLE instance (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
+    "PRAGMA application_id = 1130458221;"
+    "PRAGMA user_version = 1;";
+static_assert(kApplicationId == 1130458221);
+
+[[noreturn]] void Fail(const std::string& path, const std::string& cause) {
+  throw ProjectFailure(path + ": " + cause);
+}
+
+// SQLite's refusals in a user's words.
+[[noreturn]] void Fail(const std::string& path, const SqliteError& error) {
+  switch (error.code) {
+    case SQLITE_NOTADB:
+      Fail(path, "is no project");
+    case SQLITE_CORRUPT:
+    case SQLITE_ERROR:
+      Fail(path, "is damaged");
+    case SQLITE_FULL:
+      Fail(path, "the disk is full");
+    case SQLITE_BUSY:
+    case SQLITE_LOCKED:
+      Fail(path, "is in use by another program");
+    case SQLITE_READONLY:
+      Fail(path, "may not be written");
+    default:
+      Fail(path, error.what());
+  }
+}
+
+// The settings, each with its place in the record. One list serves both ways.
+template <class Record, class Visit>
+void VisitSettings(Record& project, const Visit& visit) {
+  visit("clip_path", project.clip_path);
+  visit("clip_relative", project.clip_relative);
+  visit("clip_content", project.clip_content);
+  visit("width", project.width);
+  visit("height", project.height);
+  visit("start_frame", project.start_frame);
+  visit("length", project.length);
+  visit("ticks_per_frame", project.ticks_per_frame);
+  visit("field_type", project.field_type);
+  visit("match_name", project.effect.match_name);
+}
+
+// Over all that a project holds. SQLite reads a cut or flipped page as it finds it.
+Guid ChecksumOf(const Project& project) {
+  Guid sum;
+  const auto mix = [&](const void* data, std::size_t size) {
+    sum = tessel::utility::MixHash(sum, data, size);
+  };
+  VisitSettings(project, [&]<class Value>(const char* key, const Value& value) {
+    mix(key, std::strlen(key));
+    if constexpr (std::is_same_v<Value, std::string>) {
+      mix(value.data(), value.size());
+    } else if constexpr (std::is_same_v<Value, Guid>) {
+      mix(value.bytes().data(), value.bytes().size());
+    } else {
+      const std::int64_t number = value;
+      mix(&number, sizeof number);
+    }
+  });
+  for (const auto& [disk_id, value] : project.effect.values) {
+    mix(&disk_id, sizeof disk_id);
+    mix(&value, sizeof value);
+  }
+  mix(project.effect.instance.data(), project.effect.instance.size());
+  return sum;
+}
+
+struct SettingWriter {
+  SqliteStatement& insert;
+
+  void operator()(const char* key, const std::string& value) const { Insert(key, value); }
+  void operator()(const char* key, const Guid& value) const { Insert(key, value.ToText()); }
+  void operator()(const char* key, std::int64_t value) const { Insert(key, value); }
+
+ private:
+  template <class Value>
+  void Insert(const char* key, const Value& value) const {
+    const std::string key_text = key;
+    insert.Bind(1, key_text);
+    insert.Bind(2, value);
+    insert.Step();
+  }
+};
+
+struct SettingReader {
+  SqliteStatement& select;
+
+  void operator()(const char* key, std::string& value) const {
+    Read(key, [&] { value = select.Text(0); });
+  }
+  void operator()(const char* key, Guid& value) const {
+    Read(key, [&] {
+      if (!Guid::Parse(select.Text(0), &value)) throw SqliteError(SQLITE_CORRUPT, key);
+    });
+  }
+  void operator()(const char* key, std::int32_t& value) const {
+    Read(key, [&] { value = static_cast<std::int32_t>(select.Integer(0)); });
+  }
+  void operator()(const char* key, std::int64_t& value) const {
+    Read(key, [&] { value = select.Integer(0); });
+  }
+
+ private:
+  void Read(const char* key, const std::function<void()>& take) const {
+    const std::string key_text = key;
+    select.Bind(1, key_text);
+    if (!select.Step()) throw SqliteError(SQLITE_CORRUPT, key);
+    take();
+    while (select.Step()) {
+    }
+  }
+};
+
+void Write(SqliteDatabase& database, const Project& project) {
+  SqliteStatement setting(database, "INSERT INTO setting VALUES (?, ?)");
+  VisitSettings(project, SettingWriter{setting});
+  SettingWriter{setting}(kChecksum, ChecksumOf(project));
+  SqliteStatement parameter(database, "INSERT INTO parameter VALUES (?, ?)");
+  for (const auto& [disk_id, value] : project.effect.values) {
+    parameter.Bind(1, std::int64_t{disk_id});
+    parameter.Bind(2, value);
+    parameter.Step();
+  }
+  SqliteStatement instance(database, "INSERT INTO instance VALUES (1, ?)");
+  instance.Bind(1, project.effect.instance);
+  instance.Step();
+}
+
+void CheckVersion(const std::string& path, SqliteDatabase& database) {
+  if (database.Number("PRAGMA application_id") != kApplicationId) Fail(path, "is no project");
+  const std::int64_t version = database.Number("PRAGMA user_version");
+  if (version > kVersion) Fail(path, "was saved by a newer version of the program");
+}
+
+void Sync(const fs::path& place) {
+  const int file = open(place.c_str(), O_RDONLY | O_CLOEXEC);
+  if (file < 0) return;
+  fsync(file);
+  close(file);
+}
+
+// A new file gets its name when it is whole.
+void Create(const fs::path& path, const Project& project) {
+  std::string temporary = path.parent_path() / ".";
+  temporary += path.filename().string();
+  temporary += ".XXXXXX";
+  const int made = mkstemp(temporary.data());
+  if (made < 0) Fail(path, std::strerror(errno));
+  close(made);
+  try {
+    {
+      SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
+      database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
+      database.Run(kCreate);
+      Write(database, project);
+      database.Run("COMMIT");
+    }
+    chmod(temporary.c_str(), 0644);
+    Sync(temporary);
+    fs::rename(temporary, path);
+    Sync(path.parent_path());
+  } catch (...) {
+    unlink(temporary.c_str());
+    throw;
+  }
+}
+
+void Replace(const fs::path& path, const Project& project) {
+  SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
+  CheckVersion(path, database);
+  database.Run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
+  database.Run("DELETE FROM setting; DELETE FROM parameter; DELETE FROM instance");
+  Write(database, project);
+  database.Run("COMMIT");
+}
+
+}  // namespace
+
+void SaveProject(const std::string& path, const Project& project) try {
+  std::error_code error;
+  const fs::path place = fs::weakly_canonical(fs::absolute(path), error);
+  Project saved = project;
+  const fs::path clip = fs::weakly_canonical(fs::absolute(project.clip_path), error);
+  saved.clip_path = clip;
+  saved.clip_relative = clip.lexically_relative(place.parent_path());
+  if (fs::exists(place, error)) {
+    Replace(place, saved);
+  } else {
+    Create(place, saved);
+  }
+} catch (const SqliteError& error) {
+  Fail(path, error);
+} catch (const fs::filesystem_error& error) {
+  Fail(path, error.code().message());
+}
+
+Project LoadProject(const std::string& path) try {
+  std::error_code error;
+  if (!fs::exists(path, error)) Fail(path, "is not there");
+  // For writing, since an interrupted save is first taken back; SQLite does without where it must.
+  SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
+  CheckVersion(path, database);
+  Project project;
+  SqliteStatement setting(database, "SELECT value FROM setting WHERE key = ?");
+  VisitSettings(project, SettingReader{setting});
+  SqliteStatement parameter(database, "SELECT disk_id, value FROM parameter");
+  while (parameter.Step()) {
+    project.effect.values[static_cast<std::int32_t>(parameter.Integer(0))] = parameter.Real(1);
+  }
+  SqliteStatement instance(database, "SELECT bytes FROM instance");
+  if (!instance.Step()) throw SqliteError(SQLITE_CORRUPT, "instance");
+  project.effect.instance = instance.Bytes(0);
+  Guid checksum;
+  SettingReader{setting}(kChecksum, checksum);
+  if (checksum != ChecksumOf(project) || project.ticks_per_frame <= 0) {
+    throw SqliteError(SQLITE_CORRUPT, kChecksum);
+  }
+  return project;
+} catch (const SqliteError& error) {
+  Fail(path, error);
+}
+
+std::string FindClip(const std::string& path, const Project& project) {
+  const fs::path folder = fs::absolute(path).parent_path();
+  std::vector<fs::path> places;
+  if (!project.clip_relative.empty()) {
+    places.push_back((folder / project.clip_relative).lexically_normal());
+  }
+  places.emplace_back(project.clip_path);
+  places.push_back(folder / fs::path(project.clip_path).filename());
+  std::string changed;
+  for (const fs::path& place : places) {
+    std::error_code error;
+    if (!fs::is_regular_file(place, error)) continue;
+    if (ContentOf(place) == project.clip_content) return place;
+    if (changed.empty()) changed = place;
+  }
+  if (!changed.empty()) Fail(changed, "is not the clip that the project was made from");
+  Fail(path, "its clip " + project.clip_path + " is gone");
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <cstdint>
+#include <stdexcept>
+#include <string>
+
+#include "host/effects/effect.h"
+#include "platform/tessel/guid.h"
+
+namespace calmframe::host {
+
+// Saved work: a clip on a layer, the effect on it, and what the effect remembers.
+struct Project {
+  std::string clip_path;               // absolute, when the project was saved
+  std::string clip_relative;           // to the project's folder; empty where there is no such way
+  tessel::utility::Guid clip_content;  // ContentOf
+  std::int32_t width = 0, height = 0;  // of the clip's frames
+
+  std::int32_t start_frame = 0, length = 0;  // of the layer; see LayerState
+  std::int64_t ticks_per_frame = 0;
+  std::int32_t field_type = 0;
+
+  SavedEffect effect;
+};
+
+// One line that names the file and the cause.
+class ProjectFailure : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
+// The project's paths are made from clip_path and the project's own place. Whatever ends the
+// program or the machine meanwhile, the file is the last project or this one, whole. Several
+// programs may save to one file; each waits for the other. Throws ProjectFailure; then the file is
+// as it was.
+void SaveProject(const std::string& path, const Project& project);
+
+// Throws ProjectFailure: not there or not readable, no project, damaged, of a newer version.
+Project LoadProject(const std::string& path);
+
+// Where the project's clip lies now: at its place relative to the project, at its old place, or
+// beside the project. Throws ProjectFailure when it is nowhere, or is another clip by now.
+std::string FindClip(const std::string& path, const Project& project);
+
+}  // namespace calmframe::host

@@ -1,0 +1,86 @@
+#include "host/project/sqlite.h"
+
+namespace calmframe::host {
+namespace {
+
+constexpr int kBusyMilliseconds = 5000;
+
+void CheckCode(sqlite3* database, int code) {
+  if (code == SQLITE_OK || code == SQLITE_ROW || code == SQLITE_DONE) return;
+  throw SqliteError(code, database ? sqlite3_errmsg(database) : sqlite3_errstr(code));
+}
+
+}  // namespace
+
+SqliteDatabase::SqliteDatabase(const std::string& path, int flags) {
+  const int code = sqlite3_open_v2(path.c_str(), &database_, flags, nullptr);
+  if (code != SQLITE_OK) {
+    const SqliteError error(code, database_ ? sqlite3_errmsg(database_) : sqlite3_errstr(code));
+    sqlite3_close(database_);
+    throw error;
+  }
+  sqlite3_busy_timeout(database_, kBusyMilliseconds);
+}
+
+SqliteDatabase::~SqliteDatabase() {
+  sqlite3_close(database_);
+}
+
+void SqliteDatabase::Run(const char* sql) {
+  CheckCode(database_, sqlite3_exec(database_, sql, nullptr, nullptr, nullptr));
+}
+
+std::int64_t SqliteDatabase::Number(const char* sql) {
+  SqliteStatement statement(*this, sql);
+  return statement.Step() ? statement.Integer(0) : 0;
+}
+
+SqliteStatement::SqliteStatement(SqliteDatabase& database, const char* sql) : database_(database) {
+  Check(sqlite3_prepare_v2(database.get(), sql, -1, &statement_, nullptr));
+}
+
+void SqliteStatement::Check(int code) const {
+  CheckCode(database_.get(), code);
+}
+
+void SqliteStatement::Bind(int parameter, std::int64_t value) {
+  Check(sqlite3_bind_int64(statement_, parameter, value));
+}
+
+void SqliteStatement::Bind(int parameter, double value) {
+  Check(sqlite3_bind_double(statement_, parameter, value));
+}
+
+void SqliteStatement::Bind(int parameter, const std::string& value) {
+  Check(sqlite3_bind_text64(statement_, parameter, value.data(), value.size(), SQLITE_STATIC,
+                            SQLITE_UTF8));
+}
+
+void SqliteStatement::Bind(int parameter, const std::vector<std::uint8_t>& value) {
+  // A null pointer would be no blob at all.
+  const void* bytes = value.empty() ? static_cast<const void*>("") : value.data();
+  Check(sqlite3_bind_blob64(statement_, parameter, bytes, value.size(), SQLITE_STATIC));
+}
+
+bool SqliteStatement::Step() {
+  const int code = sqlite3_step(statement_);
+  if (code == SQLITE_ROW) return true;
+  sqlite3_reset(statement_);
+  Check(code);
+  return false;
+}
+
+std::string SqliteStatement::Text(int column) const {
+  const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(statement_, column));
+  return text
+             ? std::string(text, static_cast<std::size_t>(sqlite3_column_bytes(statement_, column)))
+             : std::string();
+}
+
+std::vector<std::uint8_t> SqliteStatement::Bytes(int column) const {
+  const auto* bytes = static_cast<const std::uint8_t*>(sqlite3_column_blob(statement_, column));
+  const int size = sqlite3_column_bytes(statement_, column);
+  return bytes ? std::vector<std::uint8_t>(bytes, bytes + size) : std::vector<std::uint8_t>();
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,177 @@
+#include "host/project/project_file.h"
+
+#include <gmock/gmock.h>
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+
+#include "host/project/sqlite.h"
+#include "host/timeline/source.h"
+
+namespace calmframe::host {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::HasSubstr;
+
+class ProjectTest : public testing::Test {
+ protected:
+  ProjectTest() {
+    std::string name = (fs::temp_directory_path() / "calmframe-project-XXXXXX").string();
+    folder_ = mkdtemp(name.data());
+    fs::create_directories(folder_ / "clips");
+    WriteFile(Path("clips/walk.mp4"), "a walk");
+  }
+  ~ProjectTest() override { fs::remove_all(folder_); }
+
+  std::string Path(const std::string& name) const { return folder_ / name; }
+  static void WriteFile(const std::string& path, const std::string& text) {
+    std::ofstream(path) << text;
+  }
+
+  // Of a size that takes SQLite many pages; `mark` tells one from another throughout.
+  Project Sample(int mark, std::size_t bytes = 300000) const {
+    Project project;
+    project.clip_path = Path("clips/walk.mp4");
+    project.clip_content = ContentOf(project.clip_path);
+    project.width = 1920;
+    project.height = 1080;
+    project.start_frame = -3;
+    project.length = 495 + mark;
+    project.ticks_per_frame = 23543520;
+    project.field_type = 1;
+    project.effect.match_name = "KLPX SubspaceStabilizer";
+    project.effect.values = {{4, 150.0}, {20, 0.1 + mark}, {302, 9808}};
+    project.effect.instance.assign(bytes, static_cast<std::uint8_t>(mark));
+    return project;
+  }
+
+  static void ExpectSame(const Project& a, const Project& b) {
+    EXPECT_EQ(a.clip_content, b.clip_content);
+    EXPECT_EQ(a.width, b.width);
+    EXPECT_EQ(a.height, b.height);
+    EXPECT_EQ(a.start_frame, b.start_frame);
+    EXPECT_EQ(a.length, b.length);
+    EXPECT_EQ(a.ticks_per_frame, b.ticks_per_frame);
+    EXPECT_EQ(a.field_type, b.field_type);
+    EXPECT_EQ(a.effect.match_name, b.effect.match_name);
+    EXPECT_EQ(a.effect.values, b.effect.values);
+    EXPECT_TRUE(a.effect.instance == b.effect.instance);
+  }
+
+  static std::string Refusal(const std::function<void()>& work) {
+    try {
+      work();
+    } catch (const ProjectFailure& failure) {
+      return failure.what();
+    }
+    return "";
+  }
+
+  fs::path folder_;
+};
+
+TEST_F(ProjectTest, WhatIsSavedComesBackToTheBit) {
+  const std::string path = Path("walk.calm");
+  for (const int mark : {1, 2, 0}) {  // made, then replaced; the last has no instance bytes
+    const Project saved = Sample(mark, mark == 0 ? 0 : 300000);
+    SaveProject(path, saved);
+    ExpectSame(LoadProject(path), saved);
+  }
+  EXPECT_EQ(LoadProject(path).clip_relative, "clips/walk.mp4");
+  EXPECT_EQ(std::distance(fs::directory_iterator(folder_), {}), 2);  // the project and the clips
+}
+
+TEST_F(ProjectTest, TheClipIsFoundWhereverItWentAndKnownWhenItChanged) {
+  SaveProject(Path("walk.calm"), Sample(1));
+  // The whole folder is moved, then the project alone, then both stand side by side.
+  fs::create_directories(Path("moved"));
+  fs::copy(Path("clips"), Path("moved/clips"));
+  fs::copy(Path("walk.calm"), Path("moved/walk.calm"));
+  const Project project = LoadProject(Path("moved/walk.calm"));
+  EXPECT_EQ(FindClip(Path("moved/walk.calm"), project), Path("moved/clips/walk.mp4"));
+  fs::remove_all(Path("moved/clips"));
+  EXPECT_EQ(FindClip(Path("moved/walk.calm"), project), Path("clips/walk.mp4"));
+  fs::rename(Path("clips/walk.mp4"), Path("moved/walk.mp4"));
+  EXPECT_EQ(FindClip(Path("moved/walk.calm"), project), Path("moved/walk.mp4"));
+  // Another clip in its old place is no obstacle; alone it is one.
+  WriteFile(Path("clips/walk.mp4"), "a run");
+  EXPECT_EQ(FindClip(Path("moved/walk.calm"), project), Path("moved/walk.mp4"));
+  fs::remove(Path("moved/walk.mp4"));
+  EXPECT_THAT(Refusal([&] { FindClip(Path("moved/walk.calm"), project); }),
+              HasSubstr("clips/walk.mp4: is not the clip"));
+  fs::remove(Path("clips/walk.mp4"));
+  EXPECT_THAT(Refusal([&] { FindClip(Path("moved/walk.calm"), project); }), HasSubstr("is gone"));
+}
+
+TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
+  WriteFile(Path("notes.calm"), std::string(5000, 'n'));
+  WriteFile(Path("empty.calm"), "");
+  SqliteDatabase(Path("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
+      .Run("CREATE TABLE t (x)");
+  SaveProject(Path("newer.calm"), Sample(1));
+  SqliteDatabase(Path("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 2");
+  const struct {
+    const char* name;
+    const char* cause;
+  } cases[] = {{"notes.calm", "is no project"},
+               {"empty.calm", "is no project"},
+               {"other.calm", "is no project"},
+               {"newer.calm", "newer version"}};
+  for (const auto& c : cases) {
+    const std::uintmax_t size = fs::file_size(Path(c.name));
+    EXPECT_THAT(Refusal([&] { LoadProject(Path(c.name)); }), HasSubstr(c.cause)) << c.name;
+    EXPECT_THAT(Refusal([&] { SaveProject(Path(c.name), Sample(2)); }), HasSubstr(c.cause))
+        << c.name;
+    EXPECT_EQ(fs::file_size(Path(c.name)), size) << c.name;
+  }
+  EXPECT_THAT(Refusal([&] { LoadProject(Path("missing.calm")); }), HasSubstr("is not there"));
+  EXPECT_NE(Refusal([&] { SaveProject(Path("no/such/folder.calm"), Sample(1)); }), "");
+}
+
+TEST_F(ProjectTest, DamageIsToldAndNeverMore) {
+  SaveProject(Path("whole.calm"), Sample(1, 3000));
+  std::ifstream file(Path("whole.calm"), std::ios::binary);
+  const std::string whole{std::istreambuf_iterator<char>(file), {}};
+  for (std::size_t at = 0; at < whole.size(); at += 97) {
+    std::string damaged = whole;
+    damaged[at] = static_cast<char>(~damaged[at]);
+    WriteFile(Path("flipped.calm"), damaged);
+    // Told, or where it counts for nothing.
+    if (Refusal([&] { LoadProject(Path("flipped.calm")); }).empty()) {
+      ExpectSame(LoadProject(Path("flipped.calm")), Sample(1, 3000));
+    }
+    WriteFile(Path("cut.calm"), whole.substr(0, at));
+    if (Refusal([&] { LoadProject(Path("cut.calm")); }).empty()) {
+      ExpectSame(LoadProject(Path("cut.calm")), Sample(1, 3000));
+    }
+  }
+}
+
+TEST_F(ProjectTest, AnyInstantMayBeTheLast) {
+  const std::string path = Path("walk.calm");
+  for (int round = 0; round < 25; ++round) {
+    if (round % 5 == 0) fs::remove(path);  // the first save of a file is made in another way
+    const bool was_there = fs::exists(path);
+    const pid_t child = fork();
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+      for (int mark = 1;; mark = 3 - mark) SaveProject(path, Sample(mark));
+    }
+    usleep(static_cast<useconds_t>(700 + round * 1777 % 23000));
+    kill(child, SIGKILL);
+    waitpid(child, nullptr, 0);
+    if (!was_there && !fs::exists(path)) continue;  // the last state was none
+    const Project kept = LoadProject(path);
+    const int mark = kept.length - 495;
+    ASSERT_TRUE(mark == 1 || mark == 2) << round;
+    ExpectSame(kept, Sample(mark));
+  }
+}
+
+}  // namespace
+}  // namespace calmframe::host
