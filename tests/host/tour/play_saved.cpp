@@ -24,7 +24,7 @@ int main(int argc, char** argv) {
     const auto changes = [&effect] {
       return *ValueOf(*effect.Param(effect.IndexOf(Session::kStatusDiskId)));
     };
-    const double before = changes();
+    const double before = saved.values.at(Session::kStatusDiskId);
     if (argc > 4) effect.SetParam(kSmoothness, std::atof(argv[4]));
     if (session.TickUntilSettled(std::chrono::minutes(5)) != Session::Wait::settled) return 3;
     Operations::Get().Record(false);

@@ -273,7 +273,7 @@ TEST_F(Tour, SavedAndLoadedItGoesOn) {
   ASSERT_TRUE(copy);
   for (Effect* one : {&effect, &loaded, copy}) {
     EXPECT_EQ(Settle(*one), 8);
-    EXPECT_FALSE(Enabled(*one, kAnalyze));
+    EXPECT_EQ(Enabled(*one, kAnalyze), one == copy) << "another effect stands beneath the copy";
     EXPECT_TRUE(one->MakeRenderer()->Planned({3}).pixels);
   }
 }
