@@ -1,13 +1,17 @@
 #pragma once
 
+#include <concepts>
+#include <type_traits>
+
 #include "tracking/selector_params.h"
 #include "tracking/tracker_params.h"
 
 namespace kelp::analysis {
 
 // visit(name, value) for each field, in the order that the tracker's identity depends on.
-template <class Visit>
-void ForEachField(const marrow::tracking::SelectorParams& p, const Visit& visit) {
+template <class Params, class Visit>
+requires std::same_as<std::remove_const_t<Params>, marrow::tracking::SelectorParams>
+void ForEachField(Params& p, const Visit& visit) {
   visit("max_count", p.max_count);
   visit("spacing", p.spacing);
   visit("half_winx", p.half_winx);
@@ -21,8 +25,9 @@ void ForEachField(const marrow::tracking::SelectorParams& p, const Visit& visit)
   visit("eig_ratio_threshold", p.eig_ratio_threshold);
 }
 
-template <class Visit>
-void ForEachField(const marrow::tracking::TrackerParams& p, const Visit& visit) {
+template <class Params, class Visit>
+requires std::same_as<std::remove_const_t<Params>, marrow::tracking::TrackerParams>
+void ForEachField(Params& p, const Visit& visit) {
   visit("max_iterations", p.max_iterations);
   visit("tolerance_translation", p.tolerance_translation);
   visit("tolerance_affine", p.tolerance_affine);

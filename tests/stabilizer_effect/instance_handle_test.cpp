@@ -16,26 +16,6 @@ T WordAt(const std::string& bytes, std::size_t offset) {
   return word;
 }
 
-// A handle of the host's with these bytes, as the host-in's instance.
-void Restore(StabilizerHost& test, const std::string& bytes) {
-  HX_Handle handle = test.host.in.cb->new_handle(bytes.size());
-  std::memcpy(test.host.in.cb->lock_handle(handle), bytes.data(), bytes.size());
-  test.host.in.cb->unlock_handle(handle);
-  test.host.in.instance_handle = handle;
-  EXPECT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
-}
-
-// Little-endian: version, flags, slot, payload length, and 7 bytes that nobody uses.
-std::string FlatHandle(std::uint32_t version, std::uint64_t length, const std::string& payload) {
-  std::string bytes(24 + payload.size() + 7, '\0');
-  std::memcpy(bytes.data(), &version, 4);
-  bytes[4] = 1;
-  std::memset(bytes.data() + 8, 0xee, 8);  // a pointer of another process
-  std::memcpy(bytes.data() + 16, &length, 8);
-  std::memcpy(bytes.data() + 24, payload.data(), payload.size());
-  return bytes;
-}
-
 TEST(InstanceHandleTest, LayoutLiveAndFlattened) {
   StabilizerHost test;
   ASSERT_EQ(test.Call(HX_CMD_CREATE_INSTANCE), HX_ERR_NONE);
@@ -48,7 +28,10 @@ TEST(InstanceHandleTest, LayoutLiveAndFlattened) {
 
   ASSERT_EQ(test.Call(HX_CMD_FLATTEN_INSTANCE), HX_ERR_NONE);
   bytes = test.host.handle_bytes(test.host.in.instance_handle);
-  EXPECT_EQ(bytes, FlatHandle(16, 0, "").replace(8, 8, 8, '\0'));
+  EXPECT_EQ(WordAt<std::uint32_t>(bytes, 0), 16u);
+  EXPECT_EQ(WordAt<std::uint16_t>(bytes, 4), 1u) << "flattened, not raw";
+  EXPECT_EQ(WordAt<std::uint64_t>(bytes, 8), 0u);
+  EXPECT_EQ(WordAt<std::uint64_t>(bytes, 16), bytes.size() - 31);
   EXPECT_EQ(test.opaque_uses, 0) << "a flattened instance shares nothing";
   EXPECT_EQ(test.state(), nullptr);
   // Neither a tick nor a second flattening finds anything to do.
@@ -63,33 +46,6 @@ TEST(InstanceHandleTest, LayoutLiveAndFlattened) {
   const StabilizerState* const live = test.state();
   ASSERT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
   EXPECT_EQ(test.state(), live) << "a live handle stays as it is";
-}
-
-TEST(InstanceHandleTest, WhatCannotBeReadBecomesAnEmptyStateAndAMessage) {
-  const struct {
-    std::string bytes;
-    std::string message;
-  } cases[] = {
-      {FlatHandle(16, 0, ""), ""},
-      {FlatHandle(2, 0, ""), "old version"},
-      {FlatHandle(17, 0, ""), "newer version"},
-      {FlatHandle(16, 4, "????"), "damaged"},
-      {FlatHandle(16, std::uint64_t{1} << 40, ""), "damaged"},
-      {std::string(10, '\1'), "damaged"},
-  };
-  for (const auto& c : cases) {
-    StabilizerHost test;
-    Restore(test, c.bytes);
-    ASSERT_NE(test.state(), nullptr);
-    EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::PressAnalyze);
-    EXPECT_EQ(test.host.ShowsMessage(), !c.message.empty());
-    EXPECT_NE(std::string(test.host.out.return_msg).find(c.message), std::string::npos);
-  }
-  StabilizerHost one_by_one;
-  one_by_one.host.in.width = one_by_one.host.in.height = 1;
-  Restore(one_by_one, FlatHandle(16, 0, ""));
-  EXPECT_EQ(one_by_one.state(), nullptr);
-  EXPECT_EQ(one_by_one.Tick(), HX_ERR_NONE);
 }
 
 TEST(InstanceHandleTest, ASaveThatFailsLeavesTheInstanceLive) {

@@ -134,6 +134,10 @@ StabilizerHost::StabilizerHost(std::int32_t frames) {
   static HX_AnalysisHostSuite1 analysis_host =
       *LayerSuite<HX_AnalysisHostSuite1>(HX_ANALYSIS_HOST_SUITE);
   analysis_host.ScheduleAnalysis = [](HX_EffectRef) { return HX_Err{HX_ERR_NONE}; };
+  analysis_host.GetCompressionPreference = [](std::uint8_t* raw) {
+    *raw = current->prefers_raw ? 1 : 0;
+    return HX_Err{HX_ERR_NONE};
+  };
   analysis_host.MayStart = [](HX_EffectRef, std::uint8_t*) { return HX_Err{HX_ERR_NONE}; };
   host.Offer(HX_ANALYSIS_HOST_SUITE, HX_ANALYSIS_HOST_SUITE_VERSION, &analysis_host);
   host.Offer(HX_OPAQUE_EFFECT_DATA_SUITE, HX_OPAQUE_EFFECT_DATA_SUITE_VERSION, &kOpaque);

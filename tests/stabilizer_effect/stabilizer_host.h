@@ -81,6 +81,8 @@ class StabilizerHost {
   void* opaque = nullptr;
   int opaque_uses = 0;
 
+  bool prefers_raw = false;  // payloads of flattened instances
+
   // Of the last polygon.
   std::vector<float> polygon;
   std::int32_t polygon_frame = -1;

@@ -2,6 +2,7 @@
 
 #include "effect/host_text.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
+#include "stabilizer/effect/src/state_format/format.h"
 
 namespace kelp::effect {
 namespace {
@@ -18,7 +19,8 @@ HX_Handle NewInstanceHandle(const HostContext& context, std::uint64_t payload_le
     ShowMessage(context, GetString(context, kStringOutOfMemory));
     throw std::int32_t{HX_ERR_NO_INSTANCE};
   }
-  *InstanceHandleLock(context, handle.get()) = {kInstanceVersion, 0, 0, nullptr, payload_length};
+  *InstanceHandleLock(context, handle.get()) = {state_format::kPresentVersion, 0, 0, nullptr,
+                                                payload_length};
   return handle.release();
 }
 
@@ -36,10 +38,10 @@ FlattenedInstance InspectInstance(const HostContext& context, HX_Handle handle) 
   const std::uint64_t room = context.in->cb->handle_size(handle) - sizeof(InstanceHandleHeader);
   const InstanceHandleLock header(context, handle);
   if (!header->flattened) return FlattenedInstance::Live;
-  if (header->version < kOldestInstanceVersion) return FlattenedInstance::TooOld;
-  if (header->version > kInstanceVersion) return FlattenedInstance::TooNew;
+  if (header->version < state_format::kOldestVersion) return FlattenedInstance::TooOld;
+  if (header->version > state_format::kPresentVersion) return FlattenedInstance::TooNew;
   if (header->payload_length > room) return FlattenedInstance::Damaged;
-  return header->payload_length == 0 ? FlattenedInstance::Nothing : FlattenedInstance::Damaged;
+  return header->payload_length == 0 ? FlattenedInstance::Nothing : FlattenedInstance::Payload;
 }
 
 }  // namespace kelp::effect

@@ -10,10 +10,6 @@ namespace kelp::effect {
 
 class StabilizerState;
 
-// The format of what projects store. A step of it and what it brought stand with the reader.
-inline constexpr std::uint32_t kInstanceVersion = 16;
-inline constexpr std::uint32_t kOldestInstanceVersion = 3;
-
 // What an instance handle begins with, live or flattened. Little-endian; the payload stands behind
 // it.
 struct InstanceHandleHeader {
@@ -54,6 +50,7 @@ StabilizerState* StateOfHandle(const HostContext& context, HX_Handle handle);
 // What a handle that came from a project holds.
 enum class FlattenedInstance {
   Live,     // not flattened
+  Payload,  // to be read
   Nothing,  // of an instance that had nothing to store
   TooOld,
   TooNew,

@@ -45,7 +45,7 @@ const void* getOVVarVector(const void* block, std::int32_t frame) {
 void getCropWindow(const void* block, std::int32_t frame, float* left, float* top, float* right,
                    float* bottom) {
   ReadBlock(block, false, [&](const Contents& shared) {
-    if (!shared.crop) return false;
+    if (!shared.crop || shared.crop->rects.empty()) return false;
     const crop_rect& rect = shared.crop->rects[static_cast<std::size_t>(frame)];
     *left = rect.left;
     *top = rect.top;

@@ -7,9 +7,7 @@
 #include "analysis/effect/banner_cache.h"
 #include "analysis/effect/effect_parameters.h"
 #include "analysis/src/job_registry.h"
-#include "analysis/src/state_errors.h"
 #include "effect/effect_globals.h"
-#include "effect/host_requests.h"
 #include "effect/host_text.h"
 #include "effect/parameter_row.h"
 #include "stabilizer/effect/src/instance_handle.h"
@@ -170,47 +168,6 @@ void StabilizerEffect::CreateInstanceState(bool render_copy) {
   DetachSharedData();
   AnalysisEffect::CreateInstanceState(render_copy);
   AttachSharedData(render_copy);
-}
-
-// -- Flattened instances --
-
-void StabilizerEffect::FlattenInstance() {
-  HX_InData& in = *context().in;
-  const HX_Handle live = in.instance_handle;
-  if (!live || InspectInstance(context(), live) != FlattenedInstance::Live) return;
-  OwnedHandle flat(*in.cb, NewInstanceHandle(context(), 0));
-  InstanceHandleLock(context(), flat.get())->flattened = 1;
-  {
-    // Locked before anything changes. An analysis goes on without the state: whoever asks for the
-    // same again finds its job.
-    const InstanceHandleLock header(context(), live);
-    DetachSharedData();
-    const std::unique_ptr<StabilizerState> state(std::exchange(header->state, nullptr));
-  }
-  in.instance_handle = context().out->instance_handle = flat.release();
-  in.cb->dispose_handle(live);
-}
-
-void StabilizerEffect::ReloadInstance() {
-  if (!context().in->instance_handle) return CreateInstanceState(true);
-  static constexpr struct {
-    FlattenedInstance kind;
-    const char* message;
-  } kRefusals[] = {{FlattenedInstance::TooOld, kVersionTooOld},
-                   {FlattenedInstance::TooNew, kVersionTooNew},
-                   {FlattenedInstance::Damaged, kBadSerializedData}};
-  const FlattenedInstance kind = InspectInstance(context(), context().in->instance_handle);
-  if (kind == FlattenedInstance::Live) return;
-  for (const auto& refusal : kRefusals) {
-    if (refusal.kind == kind) {
-      analysis::ReportStateError(context().in, context().out, refusal.message, {},
-                                 analysis::AfterReport::GoOn);
-    }
-  }
-  CreateInstanceState(false);
-  // The project's counter may tell of work that nobody does any more.
-  if (GetState()) PublishStatus(FrameStatus::PressAnalyze);
-  ForceRerender(context());
 }
 
 }  // namespace kelp::effect

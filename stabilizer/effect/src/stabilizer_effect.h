@@ -66,6 +66,8 @@ class StabilizerEffect final : public analysis::effect::AnalysisEffect {
   virtual void ReloadInstance();
 
  private:
+  // That of a restored instance, where the host was not told it when the instance was saved.
+  analysis::FrameStatus UntoldStatus(const StabilizerState& state);
   // Compares what is stored with what the parameters ask for. None of them is supervised, so this
   // is where a slider's change takes effect.
   void CheckSolveParams(StabilizerState& state);

@@ -192,6 +192,57 @@ void StabilizerState::TakeOver() {
   subsequent_solve = contents.subsequent_solve;
 }
 
+SavedState StabilizerState::Save() const {
+  SavedState saved;
+  saved.source_width = source_width;
+  saved.source_height = source_height;
+  saved.par_num = par_num;
+  saved.par_den = par_den;
+  saved.all_features = all_features;
+  saved.all_features.first_frame = first_frame;
+  saved.job_input = job_input;
+  saved.tracker_identity = tracker_identity;
+  saved.source_identity = source_identity;
+  saved.analysis_tick = progress.start_tick;
+  saved.detailed = detailed;
+  if (analyzer) saved.job = analyzer->record();
+  saved.needs_solve = needs_solve;
+  saved.phase = phase;
+  saved.solve_hash = solve_hash;
+  saved.crop_hash = crop_hash;
+  if (phase == SolvePhase::Solved) {
+    saved.warper = warper;
+    saved.crop = crop;
+  }
+  return saved;
+}
+
+void StabilizerState::Load(const SavedState& saved, const analysis::JobFactory& make_job) {
+  source_width = saved.source_width;
+  source_height = saved.source_height;
+  par_num = saved.par_num;
+  par_den = saved.par_den;
+  all_features = saved.all_features;
+  first_frame = saved.all_features.first_frame;
+  job_input = saved.job_input;
+  tracker_identity = saved.tracker_identity;
+  source_identity = saved.source_identity;
+  progress.start_tick = saved.analysis_tick;
+  detailed = saved.detailed;
+  if (saved.job) {
+    analyzer = boost::make_shared<analysis::AnalyzerPrem>(*saved.job, source_identity, make_job);
+    analysis_pending = saved.analysis_pending;  // else frames would wait for nothing
+  }
+  needs_solve = saved.needs_solve;
+  phase = saved.phase;
+  solve_hash = saved.solve_hash;
+  crop_hash = saved.crop_hash;
+  warper = saved.warper;
+  crop = saved.crop;
+  MakeResultIdentityUnique();
+  solve_input_identity = result_identity;
+}
+
 RenderSettings GetRenderSettings(const ParameterReader& params) {
   RenderSettings settings;
   settings.framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));

@@ -14,6 +14,7 @@
 #include "stabilizer/effect/src/shared_data.h"
 #include "stabilizer/effect/src/solve_phase.h"
 #include "stabilizer/effect/src/solver.h"
+#include "stabilizer/effect/src/state_format/saved_state.h"
 #include "stabilizer/render/frame_renderer.h"
 
 namespace kelp::effect {
@@ -70,6 +71,12 @@ class StabilizerState final : public analysis::AnalysisState {
   void Publish(bool gpu_allowed) const;
   void TakeOver();
 
+  // What a project keeps, and back into a fresh state. A Solver at work is left out: what it works
+  // on is known to be missing. An analysis that is not done comes back with an analyzer whose jobs
+  // are made by make_job; see Analyzer::CanGoOn.
+  SavedState Save() const;
+  void Load(const SavedState& saved, const analysis::JobFactory& make_job);
+
   SolvePhase phase = SolvePhase::None;
   bool needs_solve = false;
   bool subsequent_solve = false;  // the solve is of a changed deletion
@@ -77,8 +84,9 @@ class StabilizerState final : public analysis::AnalysisState {
   // Of a solved phase; published, so never written.
   boost::shared_ptr<const marrow::stabilization::CPWarper> warper;
   boost::shared_ptr<const cropper> crop;
-  std::uint32_t solve_hash = 0;
-  std::uint32_t crop_hash = 0;
+  // SolveHash and CropHash of the results' parameters; beyond 32 bits where no parameters may fit.
+  std::int64_t solve_hash = 0;
+  std::int64_t crop_hash = 0;
   StabilizerSharedData* shared = nullptr;  // attached to; see StabilizerEffect::AttachSharedData
   // What the host still has to be told, where telling it has failed.
   analysis::FrameStatus unpublished = analysis::FrameStatus::None;

@@ -69,5 +69,8 @@ inline constexpr char kVersionTooNew[] =
 inline constexpr char kBadSerializedData[] =
     "$$$/Plugin/Stabilizer/Error/BadSerializedData=Calmframe requires re-analysis because saved "
     "data has been damaged.";
+inline constexpr char kGridMismatch[] =
+    "$$$/Plugin/Stabilizer/Error/GridMismatch=Calmframe requires re-analysis because of an old "
+    "project format.";
 
 }  // namespace kelp::effect

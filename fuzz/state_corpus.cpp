@@ -1,0 +1,36 @@
+// Writes a corpus for state_reader_fuzz into a folder: payloads of every version.
+
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+
+#include "fuzz/state_input.h"
+#include "tests/state_format/sample_payload.h"
+
+int main(int argc, char** argv) {
+  using namespace kelp::effect;
+  if (argc != 2) {
+    std::cerr << "state_corpus: name the folder\n";
+    return 2;
+  }
+  std::filesystem::create_directories(argv[1]);
+  int count = 0;
+  const auto add = [&](std::uint32_t version, std::uint8_t flags, const std::string& payload) {
+    const std::string name = "v" + std::to_string(version) + "_" + std::to_string(count++);
+    std::ofstream(std::filesystem::path(argv[1]) / name, std::ios::binary)
+        << StateInput(version, flags, payload);
+  };
+  for (std::uint32_t version = 3; version <= 16; ++version) {
+    for (const int phase : {0, 2, 4, 5}) {
+      for (const bool full : {false, true}) {
+        Sample sample;
+        sample.version = version;
+        sample.phase = phase;
+        sample.has_job = full;
+        sample.has_crop = full;
+        add(version, full ? 0 : kOneByOne, SamplePayload(sample));
+        if (full) add(version, kAsItStands, Deflated(SamplePayload(sample)));
+      }
+    }
+  }
+}

@@ -1,0 +1,57 @@
+#pragma once
+
+#include <cstdint>
+
+#include "platform/tessel/filesupport.h"
+
+// The frame of the format: its versions, and the marks between its sections.
+namespace kelp::effect::state_format {
+
+// Four letters, read as a big-endian number; they lie in the file in reverse.
+enum class Marker : std::int32_t {
+  Stab = 0x53746162,
+  Guid = 0x47756964,
+  Solv = 0x536f6c76,
+  Mesh = 0x4d657368,
+  MtoN = 0x4d746f4e,
+  StrF = 0x53747246,
+  Crop = 0x43726f70,
+  Pup = 0x50757020
+};
+
+// What each version of the format brought.
+enum : std::uint32_t {
+  kOldestVersion = 3,
+  kFixedPointPositions = 4,
+  kSourceIdentity = 5,
+  kPendingFlag = 6,
+  kSolveResults = 7,
+  kAnalysisTick = 8,
+  kFrameMap = 10,
+  kNeedsSolveFlag = 11,
+  kMarkersAndSize = 12,
+  kRawPayloads = 13,
+  kTrackerIdentity = 14,
+  kDetailedFlag = 15,
+  kCropWindow = 16,
+  kPresentVersion = kCropWindow
+};
+
+// Throws StreamError unless `count` records of at least `size` bytes each can still follow. To be
+// asked before memory is taken for them.
+inline void ExpectRoomFor(const tessel::filesupport::InputByteStream& in, std::uint64_t count,
+                          std::uint64_t size) {
+  if (count > in.MaxBytesLeft() / size) {
+    throw tessel::filesupport::StreamError("more records than bytes");
+  }
+}
+
+// A count as it is stored: never below 0.
+inline std::uint64_t ReadCount(tessel::filesupport::InputByteStream& in) {
+  std::int32_t count = 0;
+  in >> count;
+  if (count < 0) throw tessel::filesupport::StreamError("count below 0");
+  return static_cast<std::uint64_t>(count);
+}
+
+}  // namespace kelp::effect::state_format
