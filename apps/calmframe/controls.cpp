@@ -184,7 +184,11 @@ void AddControlFlags(CLI::App& command, ControlFlags& flags) {
 }
 
 void ShowExperimentalParameters(const ControlFlags& flags) {
-  if (flags.experimental) tessel::debug::DebugDatabase::Set("ShowExperimentalEffectParameters", 1);
+  constexpr char kOption[] = "ShowExperimentalEffectParameters";
+  if (!flags.experimental || tessel::debug::DebugDatabase::GetBool(kOption)) return;
+  tessel::debug::DebugDatabase::Set(kOption, 1);
+  // The solve's log comes with the option; who wants that sets it in the environment.
+  tessel::debug::SetSink([](const std::string&) {});
 }
 
 std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,

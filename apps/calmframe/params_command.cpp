@@ -10,6 +10,7 @@
 #include "apps/calmframe/param_text.h"
 #include "apps/calmframe/plugin_path.h"
 #include "host/effects/host.h"
+#include "host/project/project_file.h"
 
 namespace calmframe {
 namespace {
@@ -67,6 +68,8 @@ nlohmann::ordered_json JsonOf(const HX_ParamDef& param, double value) {
 
 ParamsCommand::ParamsCommand(CLI::App& program)
     : command_(program.add_subcommand("params", "List the effect's parameters")) {
+  command_->add_option("--project", project_, "Present values are those of this saved work")
+      ->type_name("FILE");
   AddControlFlags(*command_, controls_);
   command_->add_flag("--json", json_, "As a JSON array");
 }
@@ -77,7 +80,8 @@ void ParamsCommand::Run() {
   nlohmann::ordered_json list = nlohmann::ordered_json::array();
   try {
     const host::Host host(PluginPath());
-    const std::map<std::int32_t, double> given = ResolveControls(controls_, host.declarations());
+    std::map<std::int32_t, double> given = ResolveControls(controls_, host.declarations());
+    if (!project_.empty()) given.merge(host::LoadProject(project_).effect.values);
     for (const HX_ParamDef& param : host.declarations()) {
       if (!IsControl(param)) continue;
       const auto found = given.find(param.disk_id);

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <CLI/CLI.hpp>
+#include <string>
 
 #include "apps/calmframe/controls.h"
 
@@ -15,6 +16,7 @@ class ParamsCommand {
 
  private:
   CLI::App* const command_;
+  std::string project_;
   ControlFlags controls_;
   bool json_ = false;
 };

@@ -9,6 +9,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -220,6 +221,59 @@ TEST_F(ProgramTest, AnalyzeTellsWithoutRendering) {
   EXPECT_THAT(plain.text, HasSubstr("in.mp4: 30 frames of 160x120\ncrop window "));
   EXPECT_THAT(plain.text, HasSubstr("Auto-scale (1"));
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4"));
+}
+
+TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
+  MakeClip("in.mp4", 160, 120, 40);
+  MakeClip("other.mp4", 160, 120, 12);
+  const auto run = [&](const std::string& arguments, const std::string& told) {
+    const Outcome outcome = Run(arguments);
+    EXPECT_EQ(outcome.code, 0) << arguments << "\n" << outcome.text;
+    if (told.empty()) {
+      EXPECT_THAT(outcome.text, ::testing::Not(HasSubstr("reused"))) << arguments;
+    } else {
+      EXPECT_THAT(outcome.text, HasSubstr("work.calm: reused " + told + "\n")) << arguments;
+    }
+  };
+  const std::string work = " --project work.calm --overwrite --crf 0 ";
+  run("stabilize in.mp4 whole.mkv" + work, "");
+  run("render again.mkv" + work, "the analysis, the solve and the framing");
+  run("render part.mkv --from 8 --to 20" + work, "the analysis, the solve and the framing");
+  const auto whole = ClipReader::Open(Path("whole.mkv"));
+  const auto again = ClipReader::Open(Path("again.mkv"));
+  const auto part = ClipReader::Open(Path("part.mkv"));
+  ASSERT_EQ(part->info().frame_count, 12u);
+  std::vector<HX_Pixel8> a(160 * 120), b(160 * 120);
+  const auto same = [&] { return std::memcmp(a.data(), b.data(), a.size() * sizeof a[0]) == 0; };
+  for (std::size_t f = 0; f < 40; ++f) {
+    whole->Read(f, a.data(), 160 * 4);
+    again->Read(f, b.data(), 160 * 4);
+    EXPECT_TRUE(same()) << f;
+    if (f < 8 || f >= 20) continue;
+    part->Read(f - 8, b.data(), 160 * 4);
+    EXPECT_TRUE(same()) << f << " of the part";
+  }
+  run("stabilize in.mp4 less.mkv --maximum-scale 101" + work, "the analysis and the solve");
+  run("analyze in.mp4 --project work.calm --smoothness 10", "the analysis");
+  EXPECT_THAT(Run("params --project work.calm").text, HasSubstr("(default 50), now 10\n"));
+  run("analyze in.mp4 --project work.calm --detailed-analysis", "");
+
+  // The clip has moved beside the project; then it is another one.
+  fs::create_directories(Path("away"));
+  fs::rename(Path("in.mp4"), Path("away/in.mp4"));
+  fs::rename(Path("work.calm"), Path("away/work.calm"));
+  EXPECT_THAT(Run("info away/work.calm").text, HasSubstr("is the one that was analysed"));
+  const Outcome tracks = Run("tracks away/work.calm t.trk");
+  EXPECT_EQ(tracks.code, 0) << tracks.text;
+  EXPECT_EQ(fs::file_size(Path("t.trk")), 20u + 2000 * 40 * 16);
+  const Outcome other = Run("analyze other.mp4 --project away/work.calm");
+  EXPECT_EQ(other.code, 3);
+  ExpectOneLine(other, "is of another clip");
+  fs::rename(Path("other.mp4"), Path("away/in.mp4"));
+  const Outcome changed = Run("render --project away/work.calm x.mkv");
+  EXPECT_EQ(changed.code, 3);
+  ExpectOneLine(changed, "is not the clip");
+  EXPECT_EQ(Run("render --project gone.calm x.mkv").code, 3);
 }
 
 TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
