@@ -31,7 +31,7 @@ void AnalyzeCommand::Run() {
   SteadyClip& clip = *taken;
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
-  WorkAndLeave(clip, project_, progress);
+  const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
   const std::unique_ptr<CropWindow> crop = clip.Crop();
   if (run_.json) {
     nlohmann::ordered_json json;
@@ -44,7 +44,7 @@ void AnalyzeCommand::Run() {
       json["crop_height"] = crop->height;
     }
     std::printf("%s\n", json.dump().c_str());
-    return;
+    return unsaved.Throw();
   }
   std::printf("%s: %zu frames of %dx%d\n", input_.c_str(), info.frame_count, info.width,
               info.height);
@@ -52,6 +52,7 @@ void AnalyzeCommand::Run() {
     std::printf("crop window %dx%d, %s\n", crop->width, crop->height,
                 clip.NameOf(kAutoScaleGroup).c_str());
   }
+  unsaved.Throw();
 }
 
 }  // namespace calmframe

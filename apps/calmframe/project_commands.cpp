@@ -63,11 +63,12 @@ void RenderCommand::Run() {
   }
   const std::unique_ptr<media::ClipWriter> writer = media::ClipWriter::Create(
       output_, PartOf(info, range), info.width, info.height, flags_.encode);
-  WorkAndLeave(*clip, project_, progress);
+  const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   CheckCrop(*clip, progress);
   RenderClip(*clip, range, flags_.depth, run_.threads, *writer, progress);
   writer->Finish();
   for (const std::string& line : writer->warnings()) progress.Warn(line);
+  unsaved.Throw();
 }
 
 InfoCommand::InfoCommand(CLI::App& program)

@@ -28,15 +28,21 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
   return std::make_unique<SteadyClip>(saved, clip, controls);
 }
 
-void WorkAndLeave(SteadyClip& clip, const std::string& project, ProgressLine& progress) {
+void Unsaved::Throw() const {
+  if (!line_.empty()) throw media::Failure(media::Failure::Side::output, line_);
+}
+
+Unsaved WorkAndLeave(SteadyClip& clip, const std::string& project, ProgressLine& progress) {
   const Reuse reuse = clip.Work(progress);
-  if (project.empty()) return;
+  if (project.empty()) return Unsaved();
   if (const std::string text = reuse.Text(); !text.empty()) progress.Note(project + ": " + text);
+  if (reuse.framing && !clip.has_new_controls()) return Unsaved();
   try {
     host::SaveProject(project, clip.Saved());
   } catch (const host::ProjectFailure& failure) {
-    throw media::Failure(media::Failure::Side::output, failure.what());
+    return Unsaved(failure.what());
   }
+  return Unsaved();
 }
 
 }  // namespace calmframe

@@ -3,6 +3,7 @@
 #include <CLI/CLI.hpp>
 #include <memory>
 #include <string>
+#include <utility>
 
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
@@ -17,7 +18,21 @@ void AddProjectFlag(CLI::App& command, std::string& project);
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
                                    const ControlFlags& controls);
 
-// Does what is left to do, tells what was reused, and saves. No project is an empty name.
-void WorkAndLeave(SteadyClip& clip, const std::string& project, ProgressLine& progress);
+// A save that failed: the work is done all the same, and whoever asked for it gets its result
+// first.
+class Unsaved {
+ public:
+  explicit Unsaved(std::string line = "") : line_(std::move(line)) {}
+  // Throws media::Failure if there is something to tell.
+  void Throw() const;
+
+ private:
+  std::string line_;
+};
+
+// Does what is left to do, tells what was reused, and saves what is new. No project is an empty
+// name.
+[[nodiscard]] Unsaved WorkAndLeave(SteadyClip& clip, const std::string& project,
+                                   ProgressLine& progress);
 
 }  // namespace calmframe

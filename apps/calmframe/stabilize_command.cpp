@@ -70,11 +70,12 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
   // Made first, so that an output that cannot be written costs nobody an analysis.
   const std::unique_ptr<media::ClipWriter> writer =
       media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
-  WorkAndLeave(*clip, project, progress);
+  const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
   CheckCrop(*clip, progress);
   RenderClip(*clip, {0, info.frame_count}, flags.depth, threads, *writer, progress);
   writer->Finish();
   for (const std::string& line : writer->warnings()) progress.Warn(line);
+  unsaved.Throw();
 }
 
 StabilizeCommand::StabilizeCommand(CLI::App& program)

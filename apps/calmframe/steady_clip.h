@@ -38,6 +38,7 @@ class SteadyClip {
   const std::string& path() const { return path_; }
   const media::ClipInfo& info() const { return info_; }
   host::Host& host() { return host_; }
+  bool has_new_controls() const { return !values_.empty(); }
   host::Effect& effect() { return *effect_; }
 
   // Waits until the effect has analysed and solved the clip, as far as that is to do. Throws
