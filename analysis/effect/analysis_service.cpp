@@ -4,18 +4,17 @@
 #include "analysis/effect/analysis_parameter_rows.h"
 #include "analysis/effect/analysis_strings.h"
 #include "analysis/effect/effect_parameters.h"
+#include "analysis/effect/pick_track_file.h"
 #include "analysis/host/video_segment_render_suite_job.h"
 #include "analysis/src/identities.h"
 #include "analysis/src/mix_hash_guid.h"
 #include "analysis/src/progress.h"
 #include "analysis/src/read_job_input.h"
-#include "analysis/src/track_file.h"
 #include "effect/host_requests.h"
 #include "effect/host_text.h"
 #include "effect/suite.h"
 #include "platform/tessel/config.h"
 #include "platform/tessel/utility.h"
-#include "platform/tesselui/save_dialog.h"
 
 // What AnalysisEffect does about its analysis: the buttons, the start, the idle step, the end.
 namespace kelp::analysis::effect {
@@ -253,14 +252,7 @@ void AnalysisEffect::RefreshParams() {
 
 void AnalysisEffect::SaveTrackFile() {
   const AnalysisState* const state = GetState();
-  if (state != nullptr && state->all_features.frame_count > 0) {
-    const auto path = tesselui::SaveAs({"TRK Files (*.trk)", "trk", "trk", 4});
-    const marrow::tracking::AllFeatures& table = state->all_features;
-    if (path) {
-      WriteTrackFile(*path, table.features->data(), table.features->size(), 0, table.frame_count,
-                     static_cast<std::uint32_t>(table.feature_count));
-    }
-  }
+  if (state != nullptr && state->all_features.frame_count > 0) PickFileAndSaveTracks(state);
   UpdateButton(kSaveTrackFileParam, true, "");
 }
 

@@ -132,6 +132,11 @@ void Trace(const std::string& channel, int level, const std::string& text) {
   Write(line.str());
 }
 
+void ReportAssertion(const std::string& file, const std::string& function,
+                     const std::string& text) {
+  Write(file + ": " + function + ": " + text + "\n");
+}
+
 TimingEntry::TimingEntry(const std::string& channel, int level, const std::string& text)
     : enabled_(TraceEnabled(channel, level)), channel_(channel), level_(level), text_(text) {
   if (!enabled_) return;

@@ -37,6 +37,9 @@ std::uint64_t TraceChangeCount();
 // Writes "<thread id> <channel> <level> text" and a newline if the channel is enabled at the level.
 void Trace(const std::string& channel, int level, const std::string& text);
 
+// What should never happen, and has: always written, "<file>: <function>: <text>" and a newline.
+void ReportAssertion(const std::string& file, const std::string& function, const std::string& text);
+
 // Traces "Begin - <text>" at construction and "End - <text> [<elapsed> elapsed]" at destruction.
 class TimingEntry {
  public:

@@ -3,6 +3,8 @@
 #include <filesystem>
 #include <set>
 
+#include "analysis/effect/pick_track_file.h"
+#include "platform/tessel/debug.h"
 #include "platform/tesselui/save_dialog.h"
 #include "tests/analysis_effect/test_effect.h"
 
@@ -205,7 +207,21 @@ TEST_F(AnalysisServiceTest, TheSaveButtonWritesTheTracksWhereTheUserSays) {
   EXPECT_EQ(std::filesystem::file_size(path), 20u + 16 * 4 * 500);
   EXPECT_TRUE(Enabled(kSaveAt));
   std::filesystem::remove(path);
-  tesselui::InstallSaveDialog({});
+
+  std::string reported;
+  tessel::debug::SetSink([&reported](const std::string& text) { reported += text; });
+  PickFileAndSaveTracks(nullptr);
+  tessel::debug::SetSink({});
+  EXPECT_EQ(reported,
+            "AnalysisUtils: kelp::analysis::PickFileAndSaveTracks: state or analysis NULL, try "
+            "re-analyzing first\n");
+  EXPECT_FALSE(std::filesystem::exists(path));
+
+  tesselui::InstallSaveDialog({});  // a cancel
+  host_.params[kSaveAt].ui_flags = HX_PARAM_UI_DISABLED;
+  EXPECT_EQ(Change(kSaveAt), 0);
+  EXPECT_TRUE(Enabled(kSaveAt));
+  EXPECT_FALSE(std::filesystem::exists(path));
 }
 
 // Every operation of the host fails once, wherever it comes in a short life of an instance.

@@ -162,7 +162,10 @@ void StabilizerEffect::ReloadInstance() {
     state->unpublished = UntoldStatus(*state);
   }
   OwnedHandle live(*in.cb, AllocateInstanceHandle(kLivePayloadLength));
-  InstanceHandleLock(context(), live.get())->state = state.release();
+  {
+    const InstanceHandleLock header(context(), live.get());  // may throw, so ahead of the release
+    header->state = state.release();
+  }
   in.instance_handle = context().out->instance_handle = live.release();
   in.cb->dispose_handle(stored);
   AttachSharedData(false);

@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <string>
 
+#include "tests/host/tour/held_work.h"
 #include "tests/host/tour/played_plugin.h"
 #include "tests/host/tour/saved_file.h"
 
@@ -90,14 +91,20 @@ TEST_F(TourSaved, AnotherProcessSolvesAgainWhatChangedButDoesNotAnalyse) {
 // The analysis is the process's: here it goes on, elsewhere it is gone.
 TEST_F(TourSaved, SavedInTheMiddleOfItsAnalysis) {
   Operations::Get().Record(true);
-  Effect& effect = session().Apply(MakeLayer());
+  Hold hold;
+  ShakyClip clip;
+  clip.on_draw = [&hold](std::int64_t frame) {
+    if (frame == 5) hold.Pass();
+  };
+  Effect& effect = session().Apply(MakeLayer(clip));
   const SavedEffect not_begun = SaveOf(effect);
-  while (Session::StatusOf(effect) != 4 || Requests() < 5) session().Tick();
-  Session::PauseBackgroundWork(true);
+  session().Tick();
+  ASSERT_TRUE(hold.Reached(std::chrono::minutes(1)));
   for (int i = 0; i < 3; ++i) session().Tick();
+  EXPECT_EQ(Session::StatusOf(effect), 4);
   const SavedEffect middle = SaveOf(effect);
   EXPECT_TRUE(Enabled(effect, kCancel));
-  Session::PauseBackgroundWork(false);
+  hold.Release();
   ASSERT_EQ(Settle(effect), 8);
   Operations::Get().Record(false);
   EXPECT_LE(Requests(), 24 + 1);
