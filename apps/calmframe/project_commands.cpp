@@ -118,10 +118,12 @@ void TracksCommand::Run() {
   ControlFlags controls;
   controls.experimental = true;  // the button is one for experts
   const std::unique_ptr<SteadyClip> clip = Open(project_, controls);
+  std::error_code error;
+  if (std::filesystem::exists(output_, error)) {
+    throw media::Failure(media::Failure::Side::output, output_ + ": exists already");
+  }
   tesselui::InstallSaveDialog(
       [this](const tesselui::SaveDialogRequest&) -> std::optional<std::string> { return output_; });
-  std::error_code error;
-  std::filesystem::remove(output_, error);
   const host::CommandResult pressed =
       clip->effect().Press(clip->effect().IndexOf(kSaveTracksButton));
   tesselui::InstallSaveDialog({});

@@ -266,6 +266,7 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   const Outcome tracks = Run("tracks away/work.calm t.trk");
   EXPECT_EQ(tracks.code, 0) << tracks.text;
   EXPECT_EQ(fs::file_size(Path("t.trk")), 20u + 2000 * 40 * 16);
+  EXPECT_EQ(Run("tracks away/work.calm away/work.calm").code, 4);  // nothing is written over
   const Outcome other = Run("analyze other.mp4 --project away/work.calm");
   EXPECT_EQ(other.code, 3);
   ExpectOneLine(other, "is of another clip");
