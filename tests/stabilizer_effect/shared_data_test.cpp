@@ -16,7 +16,8 @@ namespace {
 // An instance of a render on records of its own.
 class RenderInstance {
  public:
-  explicit RenderInstance(const FakeHost& host) : in_(host.in) {
+  explicit RenderInstance(const FakeHost& host) : RenderInstance(host.in) {}
+  explicit RenderInstance(const HX_InData& in) : in_(in) {
     in_.instance_handle = nullptr;
     EXPECT_EQ(Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
   }
@@ -128,8 +129,9 @@ TEST(SharedDataTest, RendersWhileTheUserInterfaceWorks) {
   std::atomic<bool> end{false};
   std::vector<std::thread> renders;
   for (int i = 0; i < 3; ++i) {
-    renders.emplace_back([&, i] {
-      RenderInstance render(test.host);
+    // The records are copied here: the user interface's own change while the threads start.
+    renders.emplace_back([&, i, in = test.host.in] {
+      RenderInstance render(in);
       for (int frame = i; !end; frame = (frame + 1) % 8) {
         render.in().current_time = frame;
         EXPECT_EQ(render.Call(HX_CMD_PREPARE_FRAME), HX_ERR_NONE);
