@@ -1,3 +1,4 @@
+#include "pipeline/host_operations.h"
 #include "stabilizer/render/frame_renderer.h"
 
 #include <benchmark/benchmark.h>
@@ -38,6 +39,7 @@ class Clip final : public ClipWarps {
   }
   std::size_t frameCount() const override { return 1; }
   const VarVector& frameWarp(std::size_t) const override { return warp_; }
+  bool warpedGridOfFrame(std::size_t, std::size_t, VarVector&) const override { return false; }
   frame_bounds unionBounds() const override { return bounds_; }
   std::int32_t frameWidth() const override { return width_; }
   std::int32_t frameHeight() const override { return height_; }
@@ -126,7 +128,7 @@ struct Render {
     crop.rects[0] = {left, left + crop.cropWidth - 1, top, top + crop.cropHeight - 1};
   }
 
-  void operator()() { renderFrame<Pixel>(clip, &crop, {}, renderer, 0, source, out); }
+  void operator()() { renderFrame<Pixel>(clip, &crop, {}, renderer, 0, source, operations, out); }
 
   // Source position of every output pixel: the crop's centre goes to the output's.
   cv::Mat Map() {
@@ -148,6 +150,7 @@ struct Render {
   Clip clip;
   Renderer renderer;
   Frame<Pixel> source;
+  calmframe::pipeline::HostOperations<Pixel> operations;
   cropper crop;
   WorldX<Pixel> out;
 };

@@ -2,6 +2,7 @@
 #include <boost/make_shared.hpp>
 #include <cstring>
 
+#include "pipeline/host_operations.h"
 #include "pipeline/pictures.h"
 #include "pipeline/stabilize.h"
 #include "stabilizer/render/cp_warper_warps.h"
@@ -76,7 +77,8 @@ class PictureRenderer {
   void Render(std::size_t picture, WorldX<Pixel>& output) {
     const bool same = rect_.width == output.width() && rect_.height == output.height();
     WorldX<Pixel>& target = same ? output : whole_;
-    if (!renderFrame(warps_, crop_.get(), settings_, renderer_, picture, sources_, target)) {
+    if (!renderFrame(warps_, crop_.get(), settings_, renderer_, picture, sources_, operations_,
+                     target)) {
       throw SolveFailure("a frame has no warp");
     }
     if (!same) CopyWindow(whole_, rect_.origin_x, rect_.origin_y, output);
@@ -84,6 +86,7 @@ class PictureRenderer {
 
  private:
   ClipSource<Pixel> sources_;
+  HostOperations<Pixel> operations_;
   const CPWarperWarps warps_;
   const boost::shared_ptr<const cropper> crop_;
   const RenderSettings settings_;

@@ -14,6 +14,13 @@ class CPWarperWarps final : public ClipWarps {
   const marrow::stabilization::VarVector& frameWarp(std::size_t frame) const override {
     return *warper_->frameWarp(frame);
   }
+  bool warpedGridOfFrame(std::size_t M, std::size_t N,
+                         marrow::stabilization::VarVector& warp) const override {
+    warp.cols = gridCols();
+    warp.rows = gridRows();
+    return warper_->warpedGridOfFrame(static_cast<std::int32_t>(M), static_cast<std::int32_t>(N),
+                                      warp.values);
+  }
   marrow::stabilization::frame_bounds unionBounds() const override {
     return warper_->unionBounds();
   }

@@ -105,23 +105,44 @@ void warpFrameInto(const VarVector& warp, const crop_rect& cropRect, double zoom
 }
 
 template <class Pixel>
+bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output) {
+  VarVector aligned;
+  const VarVector* warp = &aligned;
+  if (M == pass.frame) {
+    warp = &pass.warps.frameWarp(M);
+  } else if (!pass.warps.warpedGridOfFrame(M, pass.frame, aligned)) {
+    return false;
+  }
+  const boost::shared_ptr<const WorldX<Pixel>> source = pass.sources.Fetch(M);
+  warpFrameInto(*warp, pass.cropRect, pass.zoom, pass.settings, pass.renderer, *source, output);
+  return true;
+}
+
+template <class Pixel>
 bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettings& settings,
                  Renderer& renderer, std::size_t frame, SourceFrames<Pixel>& sources,
-                 WorldX<Pixel>& output) {
+                 WorldOperations<Pixel>& operations, WorldX<Pixel>& output) {
   if (frame >= warps.frameCount()) return false;
   output.clear();
-  const boost::shared_ptr<const WorldX<Pixel>> source = sources.Fetch(frame);
   const double zoom = GetZoom(warps, crop, settings, renderer);
-  const crop_rect rect = scaled_crop(crop, crops(settings.framing), frame, renderer);
-  warpFrameInto(warps.frameWarp(frame), rect, zoom, settings, renderer, *source, output);
-  return true;
+  const FramePass<Pixel> pass{warps,
+                              settings,
+                              renderer,
+                              sources,
+                              operations,
+                              frame,
+                              scaled_crop(crop, crops(settings.framing), frame, renderer),
+                              zoom};
+  return drawFrame(pass, frame, output);
 }
 
 #define CALMFRAME_INSTANTIATE(Pixel)                                                             \
   template void warpFrameInto(const VarVector&, const crop_rect&, double, const RenderSettings&, \
                               const Renderer&, const WorldX<Pixel>&, WorldX<Pixel>&);            \
+  template bool drawFrame(const FramePass<Pixel>&, std::size_t, WorldX<Pixel>&);                 \
   template bool renderFrame(const ClipWarps&, const cropper*, const RenderSettings&, Renderer&,  \
-                            std::size_t, SourceFrames<Pixel>&, WorldX<Pixel>&);
+                            std::size_t, SourceFrames<Pixel>&, WorldOperations<Pixel>&,          \
+                            WorldX<Pixel>&);
 CALMFRAME_INSTANTIATE(HX_Pixel8)
 CALMFRAME_INSTANTIATE(HX_Pixel16)
 CALMFRAME_INSTANTIATE(HX_PixelFloat)

@@ -28,6 +28,10 @@ class ClipWarps {
   virtual ~ClipWarps() = default;
   virtual std::size_t frameCount() const = 0;
   virtual const marrow::stabilization::VarVector& frameWarp(std::size_t frame) const = 0;
+  // The rest grid of source frame M as it lies in the output of frame N, into `warp`; false where
+  // no motion between the two is known.
+  virtual bool warpedGridOfFrame(std::size_t M, std::size_t N,
+                                 marrow::stabilization::VarVector& warp) const = 0;
   virtual marrow::stabilization::frame_bounds unionBounds() const = 0;
   virtual std::int32_t frameWidth() const = 0;  // square pixels
   virtual std::int32_t frameHeight() const = 0;
@@ -42,6 +46,18 @@ class SourceFrames {
  public:
   virtual ~SourceFrames() = default;
   virtual boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) = 0;
+};
+
+// What a render has its host do on frame buffers. Failures are thrown and leave the render.
+template <class Pixel>
+class WorldOperations {
+ public:
+  virtual ~WorldOperations() = default;
+  // Composes `from`, its top left at pixel (x, y) of `to`, behind what `to` holds: what is opaque
+  // there stays, what is transparent is filled.
+  virtual void TransferBehind(const WorldX<Pixel>& from, int x, int y, WorldX<Pixel>& to) = 0;
+  // All four channels, edges repeated; radius in pixels; both worlds are of one size.
+  virtual void Blur(const WorldX<Pixel>& from, WorldX<Pixel>& to, float radius) = 0;
 };
 
 struct RenderSettings {
@@ -92,9 +108,27 @@ void warpFrameInto(const marrow::stabilization::VarVector& warp, const crop_rect
                    double zoom, const RenderSettings& settings, const Renderer& renderer,
                    const WorldX<Pixel>& source, WorldX<Pixel>& output);
 
+// The render of one frame, as its passes share it. All referents outlive it.
+template <class Pixel>
+struct FramePass {
+  const ClipWarps& warps;
+  const RenderSettings& settings;
+  const Renderer& renderer;
+  SourceFrames<Pixel>& sources;
+  WorldOperations<Pixel>& operations;
+  std::size_t frame;   // the one that the output is of
+  crop_rect cropRect;  // of that frame, scaled
+  double zoom;
+};
+
+// Draws source frame M over what `output` holds, by its own record where it is the pass's frame,
+// else as it lies in that frame's output. False, with nothing fetched, where no motion is known.
+template <class Pixel>
+bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output);
+
 // Clears the output and draws the stabilized frame. `crop` may be null. False, with nothing done,
 // where the clip has no record of the frame.
 template <class Pixel>
 bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettings& settings,
                  Renderer& renderer, std::size_t frame, SourceFrames<Pixel>& sources,
-                 WorldX<Pixel>& output);
+                 WorldOperations<Pixel>& operations, WorldX<Pixel>& output);

@@ -8,25 +8,29 @@
 #include <boost/gil/image_view_factory.hpp>
 #include <boost/gil/typedefs.hpp>
 #include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <memory>
 
-#include "platform/hx/hx_pixel.h"
+#include "platform/hx/hx_world.h"
 
-// The gil view of a frame of `Pixel`.
+// The gil view of a frame of `Pixel`, and how the host calls its format.
 template <class Pixel>
 struct world_view;
 template <>
 struct world_view<HX_Pixel8> {
   using type = boost::gil::argb8_view_t;
+  static constexpr std::uint32_t format = HX_FORMAT_ARGB8;
 };
 template <>
 struct world_view<HX_Pixel16> {
   using type = boost::gil::argb16_view_t;
+  static constexpr std::uint32_t format = HX_FORMAT_ARGB16;
 };
 template <>
 struct world_view<HX_PixelFloat> {
   using type = boost::gil::argb32f_view_t;
+  static constexpr std::uint32_t format = HX_FORMAT_ARGBF;
 };
 
 // A frame buffer: its own, or one that somebody else keeps alive.
@@ -81,3 +85,21 @@ class WorldX {
   int height_;
   std::ptrdiff_t row_bytes_;
 };
+
+// The same pixels as the host's operations take them, at origin 0; to be read only, if the world
+// is.
+template <class Pixel>
+HX_World WorldOf(const WorldX<Pixel>& world) {
+  HX_World record{};
+  record.data = const_cast<Pixel*>(world.data());
+  record.row_bytes = static_cast<std::int32_t>(world.row_bytes());
+  record.width = world.width();
+  record.height = world.height();
+  record.format = world_view<Pixel>::format;
+  record.flags = record.format == HX_FORMAT_ARGB16 ? HX_WORLD_DEEP : 0;
+  record.extent = {0, 0, world.width(), world.height()};
+  return record;
+}
+
+// How a frame is composed behind another, at full opacity.
+inline constexpr HX_TransferMode kBehind{HX_TRANSFER_BEHIND, 0, 255, 0, 32768};

@@ -9,6 +9,8 @@
 #include <limits>
 #include <random>
 
+#include "tests/render/plain_operations.h"
+
 using marrow::stabilization::frame_bounds;
 using marrow::stabilization::inverse;
 using marrow::stabilization::matrix3;
@@ -59,6 +61,7 @@ class Clip final : public ClipWarps {
   }
   std::size_t frameCount() const override { return 1; }
   const VarVector& frameWarp(std::size_t) const override { return warp; }
+  bool warpedGridOfFrame(std::size_t, std::size_t, VarVector&) const override { return false; }
   frame_bounds unionBounds() const override { return bounds; }
   std::int32_t frameWidth() const override { return width_; }
   std::int32_t frameHeight() const override { return height_; }
@@ -229,6 +232,7 @@ void expect_as_plain(const scene& s) {
   Renderer R = MakeRenderer(clip, s.scale, s.scale);
   const auto source = textured<Pixel>(R.sourceWidth, R.sourceHeight, s.alpha);
   OneFrame<Pixel> frames(source);
+  PlainOperations<Pixel> operations;
   cropper crop(1, 1, 1);
   crop.rects[0] = {4, s.width - 7.0f, 3, s.height - 6.0f};
   crop.cropWidth = s.width - 10;
@@ -243,7 +247,7 @@ void expect_as_plain(const scene& s) {
       static_cast<std::ptrdiff_t>(sizeof(Pixel)) * out_w + 3 * alignof(Pixel);
   std::vector<unsigned char> buffer(static_cast<std::size_t>(row_bytes) * out_h + 64, 0xAB);
   WorldX<Pixel> out(out_w, out_h, row_bytes, reinterpret_cast<Pixel*>(buffer.data()));
-  ASSERT_TRUE(renderFrame(clip, &crop, settings, R, 0, frames, out));
+  ASSERT_TRUE(renderFrame(clip, &crop, settings, R, 0, frames, operations, out));
 
   std::vector<double> vertices = clip.warp.values;
   for (double& v : vertices) v *= s.scale;
@@ -348,13 +352,14 @@ TYPED_TEST(FrameRenderer, IdentityIsTheSourceAtHalfPixels) {
     }
   }
   OneFrame<TypeParam> frames(source);
+  PlainOperations<TypeParam> operations;
   RenderSettings settings;
   settings.framing = Framing::stabilize_only;
   WorldX<TypeParam> out(R.planeWidth, R.planeHeight);
-  ASSERT_TRUE(renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, out));
+  ASSERT_TRUE(renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, operations, out));
   EXPECT_NEAR(out.row(10)[20].red, unit * 4 * 19.5,
               std::max(1e-5, depth<TypeParam>::full > 1 ? 1. : 0));
-  EXPECT_FALSE(renderFrame<TypeParam>(clip, nullptr, settings, R, 1, frames, out));
+  EXPECT_FALSE(renderFrame<TypeParam>(clip, nullptr, settings, R, 1, frames, operations, out));
 }
 
 TYPED_TEST(FrameRenderer, ThreadCountNeverShows) {
@@ -362,15 +367,16 @@ TYPED_TEST(FrameRenderer, ThreadCountNeverShows) {
   clip.set(7, 7, {60, 190});  // overlapping cells across many bands
   Renderer R = MakeRenderer(clip, 1, 1);
   OneFrame<TypeParam> frames(textured<TypeParam>(320, 240, alphas::edges));
+  PlainOperations<TypeParam> operations;
   RenderSettings settings;
   settings.framing = Framing::stabilize_only;
   WorldX<TypeParam> one(R.planeWidth, R.planeHeight), many(R.planeWidth, R.planeHeight);
   {
     const tbb::global_control single(tbb::global_control::max_allowed_parallelism, 1);
-    renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, one);
+    renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, operations, one);
   }
   for (int i = 0; i < 5; ++i) {
-    renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, many);
+    renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, operations, many);
     ASSERT_EQ(std::memcmp(one.data(), many.data(),
                           sizeof(TypeParam) * static_cast<std::size_t>(one.width() * one.height())),
               0);
@@ -387,10 +393,11 @@ TEST(FrameRendererAlpha, ColourOfTransparentPixelsDoesNotShow) {
     }
   }
   OneFrame<HX_Pixel8> frames(source);
+  PlainOperations<HX_Pixel8> operations;
   RenderSettings settings;
   settings.framing = Framing::stabilize_only;
   WorldX<HX_Pixel8> out(R.planeWidth, R.planeHeight);
-  renderFrame<HX_Pixel8>(clip, nullptr, settings, R, 0, frames, out);
+  renderFrame<HX_Pixel8>(clip, nullptr, settings, R, 0, frames, operations, out);
   EXPECT_NEAR(out.row(8)[8].alpha, 128, 1);
   EXPECT_EQ(out.row(8)[8].red, 200);
   EXPECT_EQ(out.row(8)[8].blue, 50);

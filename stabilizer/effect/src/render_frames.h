@@ -10,6 +10,7 @@
 
 #include "effect/host_context.h"
 #include "effect/param_checkout.h"
+#include "effect/suite.h"
 #include "effect/world.h"
 #include "stabilizer/effect/src/frame_time.h"
 #include "stabilizer/render/frame_renderer.h"
@@ -107,6 +108,31 @@ class ClipFrames final : public SourceFrames<Pixel> {
  private:
   RenderFrames& frames_;
   const std::int64_t first_frame_;
+};
+
+// What the host's own operations do for a render.
+template <class Pixel>
+class HostOperations final : public WorldOperations<Pixel> {
+ public:
+  explicit HostOperations(const HostContext& context) : context_(context) {}
+
+  void TransferBehind(const WorldX<Pixel>& from, int x, int y, WorldX<Pixel>& to) override {
+    const HX_World source = WorldOf(from);
+    HX_World target = WorldOf(to);
+    const HX_InData& in = *context_.in;
+    ThrowIfFailed(in.cb->transfer(in.effect_ref, &source, &kBehind, nullptr, x, y, &target));
+  }
+  void Blur(const WorldX<Pixel>& from, WorldX<Pixel>& to, float radius) override {
+    constexpr std::int32_t kPasses = 1, kMode = 110, kFlag = 1;
+    const HX_World source = WorldOf(from);
+    HX_World target = WorldOf(to);
+    const ScopedSuite<HX_BlurSuite1> suite(context_);
+    ThrowIfFailed(
+        suite->Blur(context_.in->effect_ref, &source, &target, radius, kPasses, kMode, 0, kFlag));
+  }
+
+ private:
+  const HostContext& context_;
 };
 
 }  // namespace kelp::effect

@@ -257,8 +257,9 @@ bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) 
   settings.shift_y = static_cast<double>(output.origin_y) + setup.origin_y;
   Renderer renderer = MakeRenderer(state);
   ClipFrames<Pixel> clip(frames, state.first_frame);
+  HostOperations<Pixel> operations(context());
   renderFrame(CPWarperWarps(state.warper), state.crop.get(), settings, renderer, frame, clip,
-              pixels);
+              operations, pixels);
   if (!crops(settings.framing)) SendPolygon(state, frame, renderer, settings, setup);
   return true;
 }
