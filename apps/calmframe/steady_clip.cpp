@@ -1,5 +1,7 @@
 #include "apps/calmframe/steady_clip.h"
 
+#include <malloc.h>
+
 #include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstdio>
@@ -137,6 +139,8 @@ void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
   const auto waited = session_.TickUntilSettled(std::chrono::hours(24 * 30), show);
   if (waited != host::Session::Wait::settled) throw Interrupted();
   show();
+  // The render that follows has its own pattern of buffers: what the analysis took goes back.
+  malloc_trim(0);
 }
 
 Reuse SteadyClip::Work(ProgressLine& progress) {
