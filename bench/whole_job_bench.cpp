@@ -1,0 +1,212 @@
+#include <benchmark/benchmark.h>
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdlib>
+#include <filesystem>
+#include <map>
+#include <opencv2/videostab.hpp>
+#include <stdexcept>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "host/media/clip.h"
+#include "synthetic/scene.h"
+
+// The whole program as a person starts it, without an encoder: decoded, analysed, solved, rendered
+// to a null device. Beside it, turn by turn in the same run: ffmpeg's vidstabdetect and
+// vidstabtransform, each with its decode, by their defaults, and OpenCV's stabilizer of two passes.
+// All may use every processor. Counters are medians over the iterations.
+namespace {
+
+namespace fs = std::filesystem;
+
+// A folder that is gone with the process.
+const fs::path& Folder() {
+  struct Made {
+    fs::path path;
+    Made() {
+      std::string name = (fs::temp_directory_path() / "calmframe-bench-XXXXXX").string();
+      path = mkdtemp(name.data());
+    }
+    ~Made() { fs::remove_all(path); }
+  };
+  static const Made made;
+  return made.path;
+}
+
+struct Usage {
+  double seconds = 0;
+  double peak_mib = 0;
+};
+
+// A program to its end, its output thrown away. Throws where it can't be started or fails.
+Usage RunProcess(const std::vector<std::string>& words) {
+  std::vector<char*> arguments;
+  for (const std::string& word : words) arguments.push_back(const_cast<char*>(word.c_str()));
+  arguments.push_back(nullptr);
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  for (const int stream : {0, 1, 2}) {
+    posix_spawn_file_actions_addopen(&actions, stream, "/dev/null", O_RDWR, 0);
+  }
+  const auto start = std::chrono::steady_clock::now();
+  pid_t child = 0;
+  const int failed =
+      posix_spawnp(&child, arguments[0], &actions, nullptr, arguments.data(), environ);
+  posix_spawn_file_actions_destroy(&actions);
+  int status = 0;
+  rusage usage{};
+  if (failed != 0 || wait4(child, &status, 0, &usage) != child || status != 0) {
+    throw std::runtime_error(words[0] + " failed");
+  }
+  return {std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count(),
+          static_cast<double>(usage.ru_maxrss) / 1024};
+}
+
+// A walk down a street, camera in hand; longer ones repeat the first 300 frames.
+std::string Clip(int width, int height, int frames) {
+  constexpr int kDrawn = 300;
+  const std::string path =
+      Folder() / (std::to_string(height) + "-" + std::to_string(frames) + ".mp4");
+  if (fs::exists(path)) return path;
+  if (frames > kDrawn) {
+    RunProcess({"ffmpeg", "-stream_loop", std::to_string(frames / kDrawn - 1), "-i",
+                Clip(width, height, kDrawn), "-c", "copy", path});
+    return path;
+  }
+  calmframe::media::ClipInfo info;
+  info.width = width;
+  info.height = height;
+  info.frame_rate = {30, 1};
+  info.frame_count = static_cast<std::size_t>(frames);
+  const auto writer = calmframe::media::ClipWriter::Create(path, info, width, height, {});
+  synthetic::scene_options options;
+  options.width = width;
+  options.height = height;
+  options.frame_count = frames;
+  const synthetic::scene scene(synthetic::street(1), synthetic::handheld_path({}), options);
+  std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(width) * static_cast<std::size_t>(height));
+  for (int f = 0; f < frames; ++f) {
+    scene.render(f, pixels.data(), static_cast<std::size_t>(width));
+    writer->Write(static_cast<std::size_t>(f), pixels.data(),
+                  width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8)));
+  }
+  writer->Finish();
+  return path;
+}
+
+std::string ClipOf(const benchmark::State& state) {
+  return Clip(static_cast<int>(state.range(0)), static_cast<int>(state.range(1)),
+              static_cast<int>(state.range(2)));
+}
+
+double Vidstab(const std::string& clip) {
+  const std::string motions = Folder() / "motions.trf";
+  const auto pass = [&](const std::string& filter) {
+    return RunProcess({"ffmpeg", "-i", clip, "-vf", filter, "-f", "null", "-"}).seconds;
+  };
+  return pass("vidstabdetect=result=" + motions) + pass("vidstabtransform=input=" + motions);
+}
+
+double OpencvTwoPass(const std::string& clip) {
+  const auto start = std::chrono::steady_clock::now();
+  cv::videostab::TwoPassStabilizer stabilizer;
+  stabilizer.setLog(cv::makePtr<cv::videostab::NullLog>());
+  stabilizer.setFrameSource(cv::makePtr<cv::videostab::VideoFileSource>(clip));
+  while (!stabilizer.nextFrame().empty()) {
+  }
+  return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+}
+
+double Median(std::vector<double> values) {
+  std::nth_element(values.begin(), values.begin() + values.size() / 2, values.end());
+  return values[values.size() / 2];
+}
+
+// Named figures of each turn, given out as medians.
+class Medians {
+ public:
+  explicit Medians(benchmark::State& state) : state_(state) {}
+  ~Medians() {
+    for (const auto& [name, values] : values_) state_.counters[name] = Median(values);
+  }
+  void Add(const std::string& name, double value) { values_[name].push_back(value); }
+
+ private:
+  benchmark::State& state_;
+  std::map<std::string, std::vector<double>> values_;
+};
+
+const std::string kProgram = CALMFRAME_PROGRAM;
+
+void Stabilize(benchmark::State& state) {
+  const std::string clip = ClipOf(state);
+  Medians medians(state);
+  for (auto _ : state) {
+    const Usage ours = RunProcess({kProgram, "stabilize", clip, "-"});
+    state.SetIterationTime(ours.seconds);
+    medians.Add("frames_per_s", static_cast<double>(state.range(2)) / ours.seconds);
+    medians.Add("peak_MiB", ours.peak_mib);
+    medians.Add("to_vidstab", ours.seconds / Vidstab(clip));
+    medians.Add("to_opencv", ours.seconds / OpencvTwoPass(clip));
+  }
+}
+
+void PeakMemory(benchmark::State& state) {
+  const std::string clip = ClipOf(state);
+  for (auto _ : state) {
+    const Usage ours = RunProcess({kProgram, "stabilize", clip, "-"});
+    state.SetIterationTime(ours.seconds);
+    state.counters["peak_MiB"] = ours.peak_mib;
+  }
+}
+
+// Another Smoothness on saved work: `to_first` against the run that had to analyse.
+void AnotherSmoothness(benchmark::State& state) {
+  const std::string clip = ClipOf(state);
+  const std::string project = Folder() / "saved.calm";
+  Medians medians(state);
+  int smoothness = 20;
+  for (auto _ : state) {
+    fs::remove(project);
+    const double first =
+        RunProcess({kProgram, "stabilize", clip, "-", "--project", project}).seconds;
+    const double again = RunProcess({kProgram, "stabilize", clip, "-", "--project", project,
+                                     "--smoothness", std::to_string(++smoothness)})
+                             .seconds;
+    state.SetIterationTime(again);
+    medians.Add("to_first", again / first);
+  }
+}
+
+void Help(benchmark::State& state) {
+  for (auto _ : state) state.SetIterationTime(RunProcess({kProgram, "--help"}).seconds);
+}
+
+BENCHMARK(Stabilize)
+    ->Args({1280, 720, 300})
+    ->Args({1920, 1080, 300})
+    ->Iterations(5)
+    ->UseManualTime()
+    ->Unit(benchmark::kSecond);
+BENCHMARK(PeakMemory)
+    ->Args({1920, 1080, 300})
+    ->Args({1920, 1080, 3000})
+    ->Iterations(1)
+    ->UseManualTime()
+    ->Unit(benchmark::kSecond);
+BENCHMARK(AnotherSmoothness)
+    ->Args({1920, 1080, 300})
+    ->Iterations(3)
+    ->UseManualTime()
+    ->Unit(benchmark::kSecond);
+BENCHMARK(Help)->UseManualTime()->Unit(benchmark::kMillisecond);
+
+}  // namespace
