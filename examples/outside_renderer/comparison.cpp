@@ -28,6 +28,16 @@ void KeepInner(std::vector<char>& covered, std::size_t first, std::size_t stride
 
 }  // namespace
 
+Picture CopyOf(const HX_World& world) {
+  Picture picture{world.width, world.height, {}};
+  for (std::int32_t y = 0; y < world.height; ++y) {
+    const auto* row = reinterpret_cast<const HX_Pixel8*>(static_cast<const char*>(world.data) +
+                                                         std::ptrdiff_t{world.row_bytes} * y);
+    picture.pixels.insert(picture.pixels.end(), row, row + world.width);
+  }
+  return picture;
+}
+
 Comparison Compare(const Picture& theirs, const Picture& ours) {
   if (theirs.width != ours.width || theirs.height != ours.height) return {255, 0};
   const auto width = static_cast<std::size_t>(theirs.width);

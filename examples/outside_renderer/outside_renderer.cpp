@@ -93,16 +93,6 @@ Drawn DrawOutside(const outside::Exports& exports, const void* block,
 }
 // [end]
 
-Picture Copy(const host::WorldBuffer& buffer) {
-  const HX_World& world = buffer.world();
-  Picture picture{world.width, world.height, {}};
-  for (std::int32_t y = 0; y < world.height; ++y) {
-    const auto* row = buffer.row<HX_Pixel8>(y);
-    picture.pixels.insert(picture.pixels.end(), row, row + world.width);
-  }
-  return picture;
-}
-
 Drawn DrawByPlugin(host::Effect& effect, std::int32_t frames) {
   const auto renderer = effect.MakeRenderer();
   Drawn drawn{"the plug-in", {}, 0};
@@ -111,7 +101,8 @@ Drawn DrawByPlugin(host::Effect& effect, std::int32_t frames) {
     if (!rendered.pixels) throw std::runtime_error(rendered.result.Line("the plug-in's render"));
     return rendered.pixels;
   };
-  for (std::int32_t frame = 0; frame < frames; ++frame) drawn.frames.push_back(Copy(*draw(frame)));
+  for (std::int32_t frame = 0; frame < frames; ++frame)
+    drawn.frames.push_back(outside::CopyOf(draw(frame)->world()));
   drawn.per_second = FramesPerSecond(frames, [&](std::int32_t frame) { draw(frame); });
   return drawn;
 }

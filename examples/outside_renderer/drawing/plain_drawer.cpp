@@ -10,8 +10,8 @@ struct Colour {
   float alpha, red, green, blue;
 };
 
-float Rounded(float value) {
-  return std::floor(value + 0.5f);
+float Rounded(float value) {  // value >= 0
+  return static_cast<float>(static_cast<std::int32_t>(value + 0.5f));
 }
 
 // Colours count by their alpha; what has none has no colour either.
