@@ -70,7 +70,6 @@ std::unique_ptr<outside::FrameDrawer> MakeDrawer(bool software) {
   return outside::MakePlainDrawer();
 }
 
-// [outside thread]
 // On a thread of its own. It is given the block's address, the source's frames and what the
 // controls say; everything else comes from the exports.
 Drawn DrawOutside(const outside::Exports& exports, const void* block,
@@ -91,7 +90,6 @@ Drawn DrawOutside(const outside::Exports& exports, const void* block,
   drawn.per_second = FramesPerSecond(static_cast<std::int32_t>(sources.size()), draw);
   return drawn;
 }
-// [end]
 
 Drawn DrawByPlugin(host::Effect& effect, std::int32_t frames) {
   const auto renderer = effect.MakeRenderer();

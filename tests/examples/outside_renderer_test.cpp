@@ -6,6 +6,8 @@
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
+#include <iterator>
 #include <memory>
 #include <regex>
 #include <stdexcept>
@@ -165,28 +167,53 @@ TEST_F(OutsideRenderer, FollowsTheControls) {
   EXPECT_FALSE(outside::ReadFrame(exports, nullptr, 7, solved));
 }
 
+// The page's code is the example's.
+TEST(OutsideDrawing, ThePageShowsWhatIsBuilt) {
+  const auto text_of = [](const std::string& name) {
+    std::ifstream file(CALMFRAME_ROOT "/" + name);
+    return std::string(std::istreambuf_iterator<char>(file), {});
+  };
+  std::string page = text_of("docs/embedding.md");
+  page = page.substr(page.find("## Drawing outside of the plug-in"));
+  page = page.substr(0, page.find("\n## "));
+  const std::string example = text_of("examples/outside_renderer/outside_renderer.cpp") +
+                              text_of("examples/outside_renderer/drawing/exports.cpp");
+  const std::string fence = "```cpp\n";
+  int snippets = 0;
+  for (std::size_t at = 0; (at = page.find(fence, at)) != std::string::npos; ++snippets) {
+    at += fence.size();
+    const std::string code = page.substr(at, page.find("```", at) - at);
+    EXPECT_NE(example.find(code), std::string::npos) << code;
+  }
+  EXPECT_GE(snippets, 3);
+}
+
 // Pixels of no alpha leave no colour, and half-clear ones count by half.
 TEST(OutsideDrawing, AlphaWeighsColours) {
-  const double resting[] = {0, 0, 3, 0, 0, 1, 3, 1};
+  const double resting[] = {0, 0, 4, 0, 0, 1, 4, 1};
   const HX_VarVector warp{resting, {}, 2, 2};
   outside::SolvedFrame solved;
   solved.frame_count = 1;
   solved.columns = solved.rows = 2;
-  solved.max_x = 4;  // of other frames
+  solved.max_x = 5;  // of other frames
   solved.max_y = 2;
-  solved.source_width = 4;
+  solved.source_width = 5;
   solved.source_height = 2;
-  solved.crop_width = 4;
+  solved.crop_width = 5;
   solved.crop_height = 2;
-  solved.right = 3;
+  solved.right = 4;
   solved.bottom = 1;
   solved.warp = &warp;
   outside::Controls controls;
   controls.framing = Framing::crop;
-  const HX_Pixel8 row[] = {
-      {255, 200, 100, 0}, {0, 9, 9, 9}, {85, 50, 250, 250}, {255, 250, 50, 50}};
-  std::vector<HX_Pixel8> pixels(row, row + 4);
-  pixels.insert(pixels.end(), row, row + 4);
+  std::vector<HX_Pixel8> pixels;
+  for (int y = 0; y < 2; ++y) {
+    for (const HX_Pixel8& pixel :
+         {HX_Pixel8{255, 200, 100, 0}, HX_Pixel8{0, 9, 9, 9}, HX_Pixel8{85, 50, 250, 250},
+          HX_Pixel8{255, 250, 50, 50}, HX_Pixel8{255, 250, 50, 50}}) {
+      pixels.push_back(pixel);
+    }
+  }
   std::vector<std::unique_ptr<outside::FrameDrawer>> drawers;
   drawers.push_back(outside::MakePlainDrawer());
 #if !defined(__SANITIZE_ADDRESS__) && \
@@ -198,8 +225,8 @@ TEST(OutsideDrawing, AlphaWeighsColours) {
 #endif
   for (const auto& drawer : drawers) {
     outside::Picture picture;
-    drawer->Draw(outside::MeshOf(solved, controls), {pixels.data(), 16, 4, 2}, picture);
-    ASSERT_EQ(picture.width, 4) << drawer->name();
+    drawer->Draw(outside::MeshOf(solved, controls), {pixels.data(), 20, 5, 2}, picture);
+    ASSERT_EQ(picture.width, 5) << drawer->name();
     // Each sample lies half a pixel to the left.
     const HX_Pixel8& half = picture.pixels[1];
     EXPECT_NEAR(half.alpha, 127.5, 1) << drawer->name();
