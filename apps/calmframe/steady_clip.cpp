@@ -185,7 +185,7 @@ host::Project SteadyClip::Saved() {
 const void* SteadyClip::FirstWarp() {
   const HX_GetStabilizerData get = host_.library().exports().get_stabilizer_data;
   const HX_GetOVVarVector get_warp = host_.library().exports().get_var_vector;
-  const void* block = host_.opaque_data().Peek(effect_->shared()->reference());
+  const void* block = effect_->opaque_data();
   std::int32_t frames = 0, ignored;
   float ignored_bound;
   if (!get || !get_warp ||
@@ -199,7 +199,7 @@ const void* SteadyClip::FirstWarp() {
 
 std::unique_ptr<CropWindow> SteadyClip::Crop() {
   const HX_GetStabilizerData get = host_.library().exports().get_stabilizer_data;
-  const void* block = host_.opaque_data().Peek(effect_->shared()->reference());
+  const void* block = effect_->opaque_data();
   constexpr std::int32_t kUntouched = -1;
   std::int32_t frames, first, columns, rows, width = kUntouched, height = kUntouched, w, h;
   float left, top, right, bottom;

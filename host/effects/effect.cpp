@@ -43,6 +43,10 @@ Effect::~Effect() {
   shared_->layer()->RemoveEffect(shared_->runtime_id());
 }
 
+const void* Effect::opaque_data() const {
+  return host_.opaque_data().Peek(shared_->reference());
+}
+
 void Effect::PutOnLayer(std::size_t position) {
   EffectOperator effect;
   effect.runtime_id = shared_->runtime_id();

@@ -19,7 +19,7 @@ struct SavedEffect {
 };
 
 // An effect on a layer, as the user has it before them. Session makes and keeps it; all operations
-// but MakeRenderer and shared() belong to the session's thread.
+// but MakeRenderer, shared() and opaque_data() belong to the session's thread.
 class Effect {
  public:
   // Made by the user, or taken from a project. `position` in the layer's chain of effects, 0 next
@@ -56,6 +56,10 @@ class Effect {
 
   // Any thread, while the effect stands on its layer.
   std::unique_ptr<Renderer> MakeRenderer() { return std::make_unique<Renderer>(host_, shared_); }
+
+  // The block that the plug-in's exports take (PluginExports), null if the plug-in keeps none. It
+  // is there, at one address, as long as the effect stands on its layer. Any thread until then.
+  const void* opaque_data() const;
 
  private:
   void PutOnLayer(std::size_t position);

@@ -2,17 +2,14 @@
 #include <elf.h>
 #include <gtest/gtest.h>
 
-#include <boost/make_shared.hpp>
 #include <cstring>
 #include <fstream>
 #include <iterator>
 #include <set>
-#include <stdexcept>
 #include <string>
 #include <vector>
 
 #include "platform/hx/hx.h"
-#include "stabilizer/effect/src/shared_data.h"
 #include "tests/stabilizer_effect/stabilizer_host.h"
 
 namespace kelp::effect {
@@ -78,67 +75,6 @@ TEST_F(PluginTest, RunsCommandsAndIsGoneWhenItIsClosed) {
   ASSERT_EQ(dlclose(library_), 0);
   library_ = dlopen(CALMFRAME_PLUGIN, RTLD_NOW | RTLD_NOLOAD);
   EXPECT_EQ(library_, nullptr);
-}
-
-// What a renderer outside gets of a block.
-TEST_F(PluginTest, RendererExports) {
-  const auto allow = Find<HX_AllowCUDARendering>(HX_EXPORT_ALLOW_CUDA_RENDERING);
-  const auto warp = Find<HX_GetOVVarVector>(HX_EXPORT_GET_VAR_VECTOR);
-  const auto window = Find<HX_GetCropWindow>(HX_EXPORT_GET_CROP_WINDOW);
-  const auto data = Find<HX_GetStabilizerData>(HX_EXPORT_GET_STABILIZER_DATA);
-  ASSERT_TRUE(allow && warp && window && data && dlsym(library_, HX_EXPORT_FCD_TABLE));
-
-  std::int32_t n[8];
-  float f[4];
-  const auto reset = [&] {
-    std::fill(std::begin(n), std::end(n), -77);
-    std::fill(std::begin(f), std::end(f), -77.0f);
-  };
-  const auto ask = [&](const void* block) {
-    return data(block, &n[0], &n[1], &n[2], &n[3], &n[4], &n[5], &f[0], &f[1], &f[2], &f[3], &n[6],
-                &n[7]);
-  };
-  StabilizerSharedData block;
-  for (const void* none : {static_cast<const void*>(nullptr), static_cast<const void*>(&block)}) {
-    reset();
-    EXPECT_EQ(allow(none), 0);
-    EXPECT_EQ(warp(none, 0), nullptr);
-    window(none, 0, &f[0], &f[1], &f[2], &f[3]);
-    EXPECT_FALSE(ask(none));
-    for (const std::int32_t word : n) EXPECT_EQ(word, -77);
-    for (const float word : f) EXPECT_EQ(word, -77);
-  }
-
-  block.contents.warper = ShiftingWarper(64, 48, {{0, 0}, {10, -6}});
-  block.contents.first_frame = 5;
-  block.contents.source_width = 60;
-  block.contents.source_height = 48;
-  block.contents.gpu_allowed = true;
-  EXPECT_EQ(allow(&block), 1);
-  EXPECT_EQ(warp(&block, 1), block.contents.warper->frameWarp(1).get());
-  EXPECT_THROW(warp(&block, 2), std::out_of_range);
-  EXPECT_THROW(warp(&block, -1), std::out_of_range);
-  reset();
-  window(&block, 0, &f[0], &f[1], &f[2], &f[3]);
-  EXPECT_EQ(f[0], -77);
-  ASSERT_TRUE(ask(&block));
-  const auto& grid = *block.contents.warper;
-  const std::int32_t numbers[] = {2, 5, grid.gridCols(), grid.gridRows(), -77, -77, 60, 48};
-  EXPECT_TRUE(std::equal(std::begin(n), std::end(n), numbers));
-  const float bounds[] = {0, -6, 73, 47};
-  EXPECT_TRUE(std::equal(std::begin(f), std::end(f), bounds));
-
-  const auto crop = boost::make_shared<cropper>(2, 74, 54);
-  crop->cropWidth = 40;
-  crop->cropHeight = 30;
-  crop->rects[1] = {1, 2, 3, 4};  // left, right, top, bottom
-  block.contents.crop = crop;
-  ASSERT_TRUE(ask(&block));
-  EXPECT_EQ(n[4], 40);
-  EXPECT_EQ(n[5], 30);
-  window(&block, 1, &f[0], &f[1], &f[2], &f[3]);
-  const float rect[] = {1, 3, 2, 4};
-  EXPECT_TRUE(std::equal(std::begin(f), std::end(f), rect));
 }
 
 }  // namespace

@@ -1,3 +1,4 @@
+#include <cstddef>
 #include <cstdint>
 #include <mutex>
 #include <shared_mutex>
@@ -6,9 +7,15 @@
 #include "stabilizer/effect/src/shared_data.h"
 
 // What a renderer outside the plug-in calls; see platform/hx/hx_exports.h. Each reads under the
-// block's lock and keeps nothing of it.
+// block's lock.
 
 using kelp::effect::StabilizerSharedData;
+using marrow::stabilization::VarVector;
+
+// HX_VarVector is how a VarVector lies in memory: a vector begins with its data's address.
+static_assert(sizeof(HX_VarVector) == sizeof(VarVector) &&
+              offsetof(HX_VarVector, columns) == offsetof(VarVector, cols) &&
+              offsetof(HX_VarVector, rows) == offsetof(VarVector, rows));
 
 namespace {
 
@@ -32,14 +39,15 @@ std::uint8_t allowCUDARendering(const void* block) {
                    [](const Contents& shared) { return std::uint8_t{shared.gpu_allowed}; });
 }
 
-// The warps of a warper are never written, and a new one takes its place only where nobody renders
-// from the old one's: that is what makes the address good once the lock is gone.
-const void* getOVVarVector(const void* block, std::int32_t frame) {
-  return ReadBlock(block, static_cast<const void*>(nullptr),
-                   [frame](const Contents& shared) -> const void* {
-                     if (!shared.warper) return nullptr;
-                     return shared.warper->frameWarp(static_cast<std::size_t>(frame)).get();
-                   });
+// A warp is never written, and a new solve brings new ones. The thread's hold is what makes the
+// address good once the lock is gone and the warper with it.
+const HX_VarVector* getOVVarVector(const void* block, std::int32_t frame) {
+  thread_local boost::shared_ptr<const VarVector> held;
+  held = ReadBlock(block, boost::shared_ptr<const VarVector>(), [frame](const Contents& shared) {
+    return shared.warper ? shared.warper->frameWarp(static_cast<std::size_t>(frame))
+                         : boost::shared_ptr<const VarVector>();
+  });
+  return reinterpret_cast<const HX_VarVector*>(held.get());
 }
 
 void getCropWindow(const void* block, std::int32_t frame, float* left, float* top, float* right,

@@ -16,8 +16,7 @@ class Tour : public PlayedPlugin {
  protected:
   // The outside renderer's view.
   const void* WarpOf(Effect& effect, std::int32_t frame) {
-    return host().library().exports().get_var_vector(
-        host().opaque_data().Peek(effect.shared()->reference()), frame);
+    return host().library().exports().get_var_vector(effect.opaque_data(), frame);
   }
 };
 
@@ -64,9 +63,7 @@ TEST_F(Tour, PathsDepthsAndPartsAgree) {
   for (int framing = 1; framing <= 4; ++framing) {
     effect.SetParam(kFraming, framing);
     ASSERT_EQ(Settle(effect), 8) << framing;
-    EXPECT_EQ(host().library().exports().allow_cuda_rendering(
-                  host().opaque_data().Peek(effect.shared()->reference())),
-              framing != 4);
+    EXPECT_EQ(host().library().exports().allow_cuda_rendering(effect.opaque_data()), framing != 4);
     for (const std::uint32_t den : {1u, 2u}) {
       const HX_Ratio ratio{1, den};
       const RenderedFrame reference = renderer->Planned({7, 32, ratio});
@@ -213,9 +210,8 @@ TEST_F(Tour, ClipsOfAnyKindComeToAnEnd) {
     std::int32_t rows = 0, first = 0, other[6];
     float bounds[4];
     EXPECT_TRUE(host().library().exports().get_stabilizer_data(
-        host().opaque_data().Peek(effect.shared()->reference()), &rows, &first, &other[0],
-        &other[1], &other[2], &other[3], &bounds[0], &bounds[1], &bounds[2], &bounds[3], &other[4],
-        &other[5]));
+        effect.opaque_data(), &rows, &first, &other[0], &other[1], &other[2], &other[3], &bounds[0],
+        &bounds[1], &bounds[2], &bounds[3], &other[4], &other[5]));
     EXPECT_EQ(rows, (fields ? 2 : 1) * layer->state()->length);
     EXPECT_EQ(first, (fields ? 2 : 1) * std::max(clip.start, 0));
     const auto renderer = effect.MakeRenderer();
