@@ -116,11 +116,10 @@ void AnalysisUIData::RefreshPoints() {
   for (std::int32_t slot = 0; slot < selected_frame_.count; ++slot) {
     const Cell& cell = cells[slot];
     if (cell.status < 0 || !std::isfinite(cell.x) || !std::isfinite(cell.y)) continue;
-    const bool goes_on = selected_frame_.has_next &&
-                         cells[selected_frame_.count + slot].status ==
-                             marrow::tracking::feature_status::kTracked;
-    points->push_back({cell.x, cell.y, overlay_scale_ * pixel_aspect_, slot,
-                       static_cast<std::uint8_t>(goes_on)});
+    const bool goes_on = selected_frame_.has_next && cells[selected_frame_.count + slot].status ==
+                                                         marrow::tracking::feature_status::kTracked;
+    points->push_back(
+        {cell.x, cell.y, overlay_scale_ * pixel_aspect_, slot, static_cast<std::uint8_t>(goes_on)});
   }
   points_ = points;
 }

@@ -97,8 +97,7 @@ void RunCustomDataOp(const kelp::effect::HostContext& context, HX_CustomDataExtr
     case HX_DATA_UNFLATTEN:
       ExpectFlat(extra.size % sizeof(DeletedTrackPoints::Key) == 0 &&
                  (extra.buffer || extra.size == 0));
-      extra.out =
-          NewValue(host, std::make_unique<DeletedTrackPoints>(extra.buffer, extra.size));
+      extra.out = NewValue(host, std::make_unique<DeletedTrackPoints>(extra.buffer, extra.size));
       return;
     case HX_DATA_COMPARE: {
       const auto order = SetOf(host, extra.a) <=> SetOf(host, extra.b);
@@ -125,8 +124,8 @@ void ClearDeletedTrackPoints(AnalysisEffect& effect) {
   HX_ParamDef param = **present;
   param.u.arb_d.value = NewValue(host, std::make_unique<DeletedTrackPoints>());
   param.change_flag = 1;
-  const HX_Err code = suite->SetParamValue(
-      context.in->effect_ref, effect.ParamIdToIndex(kDeletedTrackPointsParam), &param);
+  const HX_Err code = suite->SetParamValue(context.in->effect_ref,
+                                           effect.ParamIdToIndex(kDeletedTrackPointsParam), &param);
   if (code != HX_ERR_NONE) DisposeOfValue(host, param.u.arb_d.value);
   kelp::effect::ThrowIfFailed(code);
 }

@@ -16,8 +16,8 @@ namespace kelp::analysis::effect {
 inline constexpr std::int32_t kDeletedTrackPointsParam = 305;  // its disk id, and its id here
 
 // HX_CMD_CUSTOM_DATA_OP. Nothing for another parameter and for an operation that is none. A failed
-// operation leaves nothing behind, and its handles as they were. Throws HX_ERR_MEMORY where there is
-// no memory for a new handle, and HX_ERR_UNKNOWN for a flat form that is not one.
+// operation leaves nothing behind, and its handles as they were. Throws HX_ERR_MEMORY where there
+// is no memory for a new handle, and HX_ERR_UNKNOWN for a flat form that is not one.
 void RunCustomDataOp(const kelp::effect::HostContext& context, HX_CustomDataExtra& extra);
 
 // The present set; none where the host has no such parameter.

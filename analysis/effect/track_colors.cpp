@@ -48,8 +48,7 @@ const Color& TrackPalette::LineColor(std::size_t which) {
     const double hue = which == kTrackHues ? kSelectedHue : TrackHue(static_cast<int>(which));
     const std::int32_t hls[3] = {Fixed(hue / 360), Fixed(1), Fixed(kSaturation)};
     HX_Pixel8 rgb{};
-    kelp::effect::ThrowIfFailed(
-        context_.in->cb->hls_to_rgb(context_.in->effect_ref, hls, &rgb));
+    kelp::effect::ThrowIfFailed(context_.in->cb->hls_to_rgb(context_.in->effect_ref, hls, &rgb));
     color = Color{static_cast<float>(rgb.red) / 255, static_cast<float>(rgb.green) / 255,
                   static_cast<float>(rgb.blue) / 255, 1};
   }

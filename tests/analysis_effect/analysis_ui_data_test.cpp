@@ -29,18 +29,17 @@ class AnalysisUIDataTest : public EffectTest {
     state.first_frame = layer_.start = 10;
     state.all_features.feature_count = 6;
     state.all_features.frame_count = 2;
-    *state.all_features.features = {
-        {20.25f, 15.5f, 1, 0}, {100, 80, 1, 0},    {60, 60, -10, 0},
-        {50, 10, -1, 0},       {kNaN, 10, 0, 0},   {99, 66, 1, 0},
-        {22.25f, 14.5f, 0, 0}, {101, 80.5f, -2, 0}, {61, 60, -11, 0},
-        {50, 10, 2, 0},        {9, kNaN, 0, 0},    {99, 67, 0, 0}};
+    *state.all_features.features = {{20.25f, 15.5f, 1, 0}, {100, 80, 1, 0},     {60, 60, -10, 0},
+                                    {50, 10, -1, 0},       {kNaN, 10, 0, 0},    {99, 66, 1, 0},
+                                    {22.25f, 14.5f, 0, 0}, {101, 80.5f, -2, 0}, {61, 60, -11, 0},
+                                    {50, 10, 2, 0},        {9, kNaN, 0, 0},     {99, 67, 0, 0}};
   }
 
   struct Picture {
     explicit Picture(int width, int height, std::uint32_t format = HX_FORMAT_ARGBF)
         : data(std::size_t(width) * height * 4) {
-      world = {data.data(), width * FakePixelBytes(format), width, height, 0, 0, 0, format,
-               {0, 0, width, height}};
+      world = {data.data(), width * FakePixelBytes(format), width, height, 0, 0, 0,
+               format,      {0, 0, width, height}};
       for (int y = 0; y < height; ++y) {
         for (int x = 0; x < width; ++x) StoreFakePixel(world, x, y, {1, 0, 0, 0});
       }
@@ -121,8 +120,7 @@ TEST_F(AnalysisUIDataTest, DotsLieOnTheirFeaturesAtEveryScaleAndAspect) {
       // A pixel of the half picture covers two: its centre n is at 2 n + 1/2.
       const auto scaled = [&](double at) { return (at + 0.5) / half - 0.5; };
       for (const auto& [x, y] : {std::pair{20.25, 15.5}, {100.0, 80.0}}) {
-        const auto [found_x, found_y] =
-            whole.MiddleAround(scaled(x), scaled(y), half == 1 ? 7 : 3);
+        const auto [found_x, found_y] = whole.MiddleAround(scaled(x), scaled(y), half == 1 ? 7 : 3);
         EXPECT_NEAR(found_x, scaled(x), 0.05) << half;
         EXPECT_NEAR(found_y, scaled(y), 0.05) << half;
       }
@@ -195,9 +193,10 @@ TEST_F(AnalysisUIDataTest, DepthsShowTheSameAndTheHostLearnsWhatChanged) {
 
 // Over black: the middle has the fill, the ring at 1.1 units of 3 pixels an opaque line.
 TEST_F(AnalysisUIDataTest, ColoursTellTracksAndWhatTheMouseIsAbout) {
-  *State()->all_features.features = {
-      {20, 15, 1, 0},  {100, 80, 1, 0},  {60, 60, 1, 0},  {50, 10, -1, 0}, {0, 0, -1, 0}, {0, 0, -1, 0},
-      {31, 27, 0, 0}, {110, 90, 0, 0}, {70, 65, 0, 0}, {50, 10, -1, 0}, {0, 0, -1, 0}, {0, 0, -1, 0}};
+  *State()->all_features.features = {{20, 15, 1, 0},  {100, 80, 1, 0}, {60, 60, 1, 0},
+                                     {50, 10, -1, 0}, {0, 0, -1, 0},   {0, 0, -1, 0},
+                                     {31, 27, 0, 0},  {110, 90, 0, 0}, {70, 65, 0, 0},
+                                     {50, 10, -1, 0}, {0, 0, -1, 0},   {0, 0, -1, 0}};
   const kelp::effect::HostContext context = Context();
   TrackPalette palette(context);
   const auto expect_at = [&](const Picture& picture, int x, int y, const TrackColors& colors) {

@@ -69,7 +69,8 @@ TEST_F(DeletionsParameterTest, OperationsOnValues) {
   EXPECT_EQ(Op(HX_DATA_FLATTEN, empty).buffer, nullptr);
   const HX_Handle value = Value({30, 10, 20, 10});
   EXPECT_THAT(KeysOf(value), ElementsAre(10u, 20u, 30u));
-  const HX_Handle copy = Op(HX_DATA_COPY, value).out, between = Op(HX_DATA_INTERPOLATE, value, empty).out;
+  const HX_Handle copy = Op(HX_DATA_COPY, value).out,
+                  between = Op(HX_DATA_INTERPOLATE, value, empty).out;
   EXPECT_NE(copy, value);
   EXPECT_THAT(KeysOf(between), ElementsAre(10u, 20u, 30u));
   const HX_Handle greater = Value({10, 21});

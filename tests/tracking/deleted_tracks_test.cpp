@@ -12,7 +12,8 @@ using ::testing::ElementsAre;
 // Rows of statuses, from absolute frame 100 on. Slot 0: a track of three cells, a gap, a track of
 // two. Slot 1: a track that ends under a seed. Slot 2: cells before the first seed.
 AllFeatures Table() {
-  constexpr std::int32_t rows[][3] = {{1, 1, -1}, {0, 0, -1}, {0, 3, 3}, {-2, 0, 0}, {5, 0, -3}, {0, 0, -1}};
+  constexpr std::int32_t rows[][3] = {{1, 1, -1}, {0, 0, -1}, {0, 3, 3},
+                                      {-2, 0, 0}, {5, 0, -3}, {0, 0, -1}};
   AllFeatures table;
   table.feature_count = 3;
   table.first_frame = 100;

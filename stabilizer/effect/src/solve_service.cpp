@@ -124,13 +124,12 @@ bool StabilizerEffect::StartSolveIfNeeded(StabilizerState& state) {
   if (!state.needs_solve || !state.has_frames()) return false;
   const EffectParameters params(*this);
   const ClipGeometry clip = state.Geometry();
-  const bool started =
-      state.StartSolve(GetSolverParams(params, clip), MarginInFrames(params, clip.frame_rate),
-                       analysis::effect::ReadDeletedTrackPoints(*this),
-                       [this]() -> boost::function<void()> {
-                         const auto notifier = boost::make_shared<const SolveNotifier>(context());
-                         return [notifier] { (*notifier)(); };
-                       });
+  const bool started = state.StartSolve(
+      GetSolverParams(params, clip), MarginInFrames(params, clip.frame_rate),
+      analysis::effect::ReadDeletedTrackPoints(*this), [this]() -> boost::function<void()> {
+        const auto notifier = boost::make_shared<const SolveNotifier>(context());
+        return [notifier] { (*notifier)(); };
+      });
   if (started && !state.first_analysis) ShowInfoText(context(), nullptr, nullptr);
   return started;
 }

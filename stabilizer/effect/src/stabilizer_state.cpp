@@ -114,9 +114,9 @@ bool StabilizerState::StartSolve(const SolverParamsRecord& parameters,
   const ClipGeometry clip = Geometry();
   const Guid wanted = deletions ? deletions->Identity() : marked_deletions_;
   const bool same_tracks = wanted == marked_deletions_;
-  const Solver::Inputs inputs{clip.square_width(), clip.height,
-                              same_tracks ? all_features : TableWithout(*deletions),
-                              frame_map_radius,    parameters,  parameters.crop};
+  const Solver::Inputs inputs{
+      clip.square_width(), clip.height, same_tracks ? all_features : TableWithout(*deletions),
+      frame_map_radius,    parameters,  parameters.crop};
   if ((status == Solver::running || status == Solver::failed) && same_tracks &&
       IsAtWorkOn(inputs)) {
     return false;
