@@ -137,6 +137,28 @@ TEST_F(DeletionsTest, WithoutAMovingObjectsTracksTheBackgroundIsSteadierAndUndoI
   EXPECT_EQ(WarpsOf(*state.warper), first);
 }
 
+TEST_F(DeletionsTest, WhileItIsSolvedFramesShowTheInputUnderAFaintBanner) {
+  SetUpSolved();
+  test.SetDeletions(World::Walker());
+  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
+  test.RenderCopy();
+  EXPECT_EQ(test.Effect().GetStatusForFrame(0), FrameStatus::SubsequentSolveOnDeletion);
+  TestWorld source(640, 360, 8), output(640, 360, 8);
+  for (int y = 0; y < 360; ++y) {
+    for (int x = 0; x < 640; ++x) source.Set(x, y, 0.5, 0.5);
+  }
+  test.host.params[0].u.ld = *source.get();
+  ASSERT_EQ(test.Call(HX_CMD_PREPARE_FRAME), HX_ERR_NONE);
+  ASSERT_EQ(test.Call(HX_CMD_RENDER_FRAME, output.get()), HX_ERR_NONE);
+  // Stripes of (0.8, 0.333, 0) and four fifths of that, a fifth opaque.
+  for (const int x : {1, 60, 630}) {
+    EXPECT_NEAR(output.At(x, 156, 1), 0.544, 0.02);
+    EXPECT_NEAR(output.At(x, 156, 2), 0.46, 0.012);
+    EXPECT_NEAR(output.At(x, 156, 3), 0.2, 0.004);
+    EXPECT_NEAR(output.At(x, 20, 1), 0.5, 0.003);
+  }
+}
+
 TEST_F(DeletionsTest, UnknownPointsChangeNothingButAreSolvedOnce) {
   SetUpSolved();
   StabilizerState& state = *test.state();
@@ -203,6 +225,17 @@ TEST_F(DeletionsTest, AProjectKnowsWhatItsSolveLeftOut) {
   test.TickUntilSolved();
   EXPECT_NE(WarpsOf(*test.state()->warper), loaded);
   EXPECT_EQ((*test.state()->all_features.features)[kBackground].status, 1);
+}
+
+TEST_F(DeletionsTest, AProjectSavedDuringTheSolveSolvesItAgain) {
+  SetUpSolved();
+  const double before = world.Jitter(*test.state()->warper);
+  test.SetDeletions(World::Walker());
+  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
+  ASSERT_EQ(test.Call(HX_CMD_FLATTEN_INSTANCE), HX_ERR_NONE);
+  ASSERT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
+  test.TickUntilSolved();
+  EXPECT_LT(world.Jitter(*test.state()->warper), 0.2 * before);
 }
 
 TEST_F(DeletionsTest, AnalyzeForgetsThem) {

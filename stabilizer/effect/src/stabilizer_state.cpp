@@ -17,6 +17,10 @@ using marrow::stabilization::SolverParamsRecord;
 using marrow::tracking::AllFeatures;
 using tessel::utility::Guid;
 
+namespace {
+constexpr std::int64_t kNoParametersHash = std::int64_t{1} << 32;
+}  // namespace
+
 StabilizerState::StabilizerState(const HX_InData& in, bool keeps_jobs) {
   source_width = in.width;
   source_height = in.height;
@@ -250,6 +254,8 @@ SavedState StabilizerState::Save() const {
   saved.needs_solve = needs_solve;
   saved.phase = phase;
   saved.solve_hash = solve_hash;
+  // The table tells of other deletions than the warps are of.
+  if (deletion_identity != marked_deletions_) saved.solve_hash = kNoParametersHash;
   saved.crop_hash = crop_hash;
   if (phase == SolvePhase::Solved) {
     saved.warper = warper;
