@@ -142,13 +142,13 @@ TEST_F(DeletionsTest, WhileItIsSolvedFramesShowTheInputUnderAFaintBanner) {
   test.SetDeletions(World::Walker());
   ASSERT_EQ(test.Tick(), HX_ERR_NONE);
   test.RenderCopy();
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), FrameStatus::SubsequentSolveOnDeletion);
   TestWorld source(640, 360, 8), output(640, 360, 8);
   for (int y = 0; y < 360; ++y) {
     for (int x = 0; x < 640; ++x) source.Set(x, y, 0.5, 0.5);
   }
   test.host.params[0].u.ld = *source.get();
   ASSERT_EQ(test.Call(HX_CMD_PREPARE_FRAME), HX_ERR_NONE);
+  EXPECT_EQ(test.Effect().GetStatusForFrame(0), FrameStatus::SubsequentSolveOnDeletion);
   ASSERT_EQ(test.Call(HX_CMD_RENDER_FRAME, output.get()), HX_ERR_NONE);
   // Stripes of (0.8, 0.333, 0) and four fifths of that, a fifth opaque.
   for (const int x : {1, 60, 630}) {
