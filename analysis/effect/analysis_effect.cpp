@@ -7,6 +7,7 @@
 #include "analysis/effect/analysis_parameter_rows.h"
 #include "analysis/effect/analysis_parameter_rules.h"
 #include "analysis/effect/analysis_strings.h"
+#include "analysis/effect/deletions_parameter.h"
 #include "analysis/effect/effect_parameters.h"
 #include "analysis/src/read_job_input.h"
 #include "effect/host_requests.h"
@@ -46,6 +47,11 @@ void AnalysisEffect::ParamChanged() {
 
 void AnalysisEffect::IdleTick() {
   ServiceAnalysis(false);
+}
+
+void AnalysisEffect::CustomDataOp() {
+  if (context().extra == nullptr) return;
+  RunCustomDataOp(context(), *static_cast<HX_CustomDataExtra*>(context().extra));
 }
 
 HX_Err AnalysisEffect::AddParam(std::int32_t id) {

@@ -43,6 +43,7 @@ class AnalysisEffect : public kelp::effect::GenericEffect {
   void ParamChanged() override;
   void RefreshParams() override;
   void IdleTick() override;
+  void CustomDataOp() override;
 
   // Declares the parameter of an AnalysisParam id; any other number adds nothing.
   HX_Err AddParam(std::int32_t id) override;
@@ -83,7 +84,8 @@ class AnalysisEffect : public kelp::effect::GenericEffect {
   // That of the host-in's instance handle; null without a handle and in one without a state.
   virtual AnalysisState* GetState() = 0;
 
-  // kNoParam (-1) where there is none.
+  // kNoParam (-1) where there is none. That of kDeletedTrackPointsParam is where a host that keeps
+  // that parameter has it; it is not declared, and its index has no id.
   virtual std::int32_t ParamIdToIndex(std::int32_t id) = 0;
   virtual std::int32_t IndexToParamId(std::int32_t index) = 0;
   virtual double GetOverlayScale();

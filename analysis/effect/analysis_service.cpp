@@ -3,6 +3,7 @@
 #include "analysis/effect/analysis_effect.h"
 #include "analysis/effect/analysis_parameter_rows.h"
 #include "analysis/effect/analysis_strings.h"
+#include "analysis/effect/deletions_parameter.h"
 #include "analysis/effect/effect_parameters.h"
 #include "analysis/effect/pick_track_file.h"
 #include "analysis/host/video_segment_render_suite_job.h"
@@ -96,6 +97,8 @@ void AnalysisEffect::HandleParamChange(const HX_ParamChangedExtra& extra) {
 void AnalysisEffect::StartAnalysisFromUI() {
   bool started = false;
   try {
+    // What the user deleted is of the tracks that are to go.
+    if (context().command == HX_CMD_PARAM_CHANGED) ClearDeletedTrackPoints(*this);
     UpdateStartStopButtonEnablement(false, true, nullptr);
     const ScopedSuite<HX_AnalysisHostSuite1> suite(context());
     ThrowIfFailed(suite->ScheduleAnalysis(context().in->effect_ref));

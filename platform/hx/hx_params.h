@@ -55,8 +55,11 @@ typedef struct HX_Button {
   const char* label; /* UTF-8 text on the button; name is the text beside it */
 } HX_Button;
 
+/* Values are handles that HX_CMD_CUSTOM_DATA_OP makes and frees. No effect declares such a
+   parameter; a host that keeps the deleted track points of an effect (disk id 305) appends one to
+   those that the effect declared. */
 typedef struct HX_ArbitraryData {
-  int16_t id;
+  int16_t id; /* the disk id */
   HX_Handle default_value, value;
 } HX_ArbitraryData;
 

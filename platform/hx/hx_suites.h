@@ -15,7 +15,8 @@
 typedef struct HX_ParamUtilsSuite3 {
   /* Takes over name, flags and ui_flags. */
   HX_Err (*UpdateParamUI)(HX_EffectRef effect, int32_t index, const HX_ParamDef* param);
-  /* Takes over the value; cached output of the effect goes stale. */
+  /* Takes over the value and the change flag; cached output of the effect goes stale. The handle of
+     an arbitrary value is the host's from then on, which disposes of the one before later. */
   HX_Err (*SetParamValue)(HX_EffectRef effect, int32_t index, const HX_ParamDef* param);
 } HX_ParamUtilsSuite3;
 

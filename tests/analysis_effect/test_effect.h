@@ -28,6 +28,7 @@ namespace kelp::analysis::effect {
 // What the effect below was told, by all its objects.
 struct TestLog {
   int restarts = 0, needs_solve = 0, failed = 0, dropped_solves = 0, published = 0;
+  double overlay_scale = 1;
   boost::shared_ptr<BannerCache> banners;
   boost::shared_ptr<std::mutex> banner_lock = boost::make_shared<std::mutex>();
 };
@@ -94,6 +95,7 @@ class TestEffect final : public AnalysisEffect {
     StartAnalysis();
     PublishStatus(FrameStatus::AnalysisInProgress);
   }
+  double GetOverlayScale() override { return log.overlay_scale; }
   void DropSolveJob() override { ++log.dropped_solves; }
   void CreateStateInHandle(HX_Handle handle, bool keep_jobs) override {
     const kelp::effect::HandleLock slot = Slot(handle);

@@ -1,6 +1,7 @@
 #include "tests/effect/fake_host.h"
 
 #include <algorithm>
+#include <cmath>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
@@ -161,7 +162,10 @@ struct FakeHostCallbacks {
   static HX_Err SetParamValue(HX_EffectRef, std::int32_t index, const HX_ParamDef* param) {
     Lock lock(current->mutex_);
     if (current->Operate("Param Utils.SetParamValue")) return FakeHost::kFault;
-    current->params.at(static_cast<std::size_t>(index)).u = param->u;
+    HX_ParamDef& own = current->params.at(static_cast<std::size_t>(index));
+    if (own.kind == HX_PARAM_ARBITRARY) current->replaced_values.push_back(own.u.arb_d.value);
+    own.u = param->u;
+    own.change_flag = param->change_flag;
     return HX_ERR_NONE;
   }
 
@@ -248,6 +252,27 @@ struct FakeHostCallbacks {
                                                                     : HX_ERR_NONE;
   }
 
+  // A colour of full value, by the distance of its hue from those of the components: each is full
+  // within 60 degrees of its own and least from 120 degrees on.
+  static HX_Err HlsToRgb(HX_EffectRef, const std::int32_t hls[3], HX_Pixel8* rgb) {
+    Lock lock(current->mutex_);
+    if (current->Operate("hls_to_rgb")) return FakeHost::kFault;
+    current->Expect(hls[1] == 65536, "a hue of another lightness");
+    const auto component = [&](double own_hue) {
+      const double apart = std::abs(std::remainder(hls[0] * 360.0 / 65536 - own_hue, 360.0));
+      const double share = std::clamp((120 - apart) / 60, 0.0, 1.0);
+      return static_cast<std::uint8_t>(std::lround(255 * (1 - hls[2] / 65536.0 * (1 - share))));
+    };
+    *rgb = {255, component(0), component(120), component(240)};
+    return HX_ERR_NONE;
+  }
+  static HX_Err InvalidateRect(void*, const HX_Rect* rect) {
+    Lock lock(current->mutex_);
+    if (current->Operate("App.InvalidateRect")) return FakeHost::kFault;
+    current->invalidated.push_back(*rect);
+    return HX_ERR_NONE;
+  }
+
   static HX_Err NewWorld(HX_EffectRef, std::int32_t width, std::int32_t height, std::uint8_t,
                          std::uint32_t format, HX_World* world) {
     Lock lock(current->mutex_);
@@ -281,6 +306,7 @@ struct FakeHostCallbacks {
   static constexpr HX_PrivateEffectSuite3 kPrivate = {ConvertText, nullptr, nullptr, nullptr,
                                                       ForceRerender};
   static constexpr HX_AdvAppSuite1 kAdvApp = {RefreshAllWindows, InfoText};
+  static constexpr HX_AppSuite6 kApp = {InvalidateRect};
   static constexpr HX_WorldSuite2 kWorlds = {NewWorld, DisposeWorld};
 
   static const HX_Callbacks& Callbacks() {
@@ -303,6 +329,7 @@ struct FakeHostCallbacks {
       cb.copy_world = CopyWorld;
       cb.transfer = Transfer;
       cb.utility = Utility;
+      cb.hls_to_rgb = HlsToRgb;
       return cb;
     }();
     return callbacks;
@@ -314,6 +341,7 @@ FakeHost::FakeHost() : params(1) {
   current = this;
   Offer(HX_PARAM_UTILS_SUITE, HX_PARAM_UTILS_SUITE_VERSION, &FakeHostCallbacks::kParamUtils);
   Offer(HX_PRIVATE_EFFECT_SUITE, HX_PRIVATE_EFFECT_SUITE_VERSION, &FakeHostCallbacks::kPrivate);
+  Offer(HX_APP_SUITE, HX_APP_SUITE_VERSION, &FakeHostCallbacks::kApp);
   Offer(HX_ADV_APP_SUITE, HX_ADV_APP_SUITE_VERSION, &FakeHostCallbacks::kAdvApp);
   Offer(HX_WORLD_SUITE, HX_WORLD_SUITE_VERSION, &FakeHostCallbacks::kWorlds);
   in.basic = &FakeHostCallbacks::kBasic;

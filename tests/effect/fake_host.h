@@ -51,7 +51,8 @@ class FakeHost {
   // How many operations have this name.
   int Count(const std::string& name) const;
 
-  // Offers a table beside the fake's own: Param Utils 3, Private Effect 3, Adv App 1 and World 2.
+  // Offers a table beside the fake's own: Param Utils 3, Private Effect 3, App 6, Adv App 1 and
+  // World 2.
   void Offer(const std::string& name, std::int32_t version, const void* table);
 
   // Held by every operation: for a test that changes what other threads read.
@@ -60,6 +61,10 @@ class FakeHost {
   // Index 0 is the layer; the rest is what add_param appended. Checkouts give copies.
   std::vector<HX_ParamDef> params;
   std::vector<std::int32_t> checkout_times;
+  // Arbitrary values that SetParamValue took others for; the test disposes of them.
+  std::vector<HX_Handle> replaced_values;
+
+  std::vector<HX_Rect> invalidated;
 
   // What the information panel shows, a line after the other.
   std::vector<std::string> info_text() const;

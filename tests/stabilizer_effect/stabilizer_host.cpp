@@ -150,10 +150,17 @@ StabilizerHost::StabilizerHost(std::int32_t frames) {
   layer.top = layer.AddPlainClip("11111111-2222-3333-4444-555555555555");
   EXPECT_EQ(Call(HX_CMD_START_PLUGIN), HX_ERR_NONE);
   EXPECT_EQ(Call(HX_CMD_DECLARE_PARAMS), HX_ERR_NONE);
+  PointAtParams();
+}
+
+void StabilizerHost::PointAtParams() {
+  params_.clear();
   for (HX_ParamDef& param : host.params) params_.push_back(&param);
 }
 
 StabilizerHost::~StabilizerHost() {
+  if (keeps_deletions_) host.replaced_values.push_back(deletions_param().u.arb_d.value);
+  for (const HX_Handle value : host.replaced_values) DataOp(HX_DATA_DISPOSE, value);
   Destroy();
   for (const HX_Handle handle : handles_) {
     host.in.instance_handle = handle;
@@ -222,6 +229,42 @@ StabilizerState& StabilizerHost::RenderCopy() {
   host.in.instance_handle = nullptr;
   EXPECT_EQ(Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
   return *state();
+}
+
+HX_CustomDataExtra StabilizerHost::DataOp(std::int32_t op, HX_Handle a, std::vector<char>* flat) {
+  HX_CustomDataExtra extra{};
+  extra.op = op;
+  extra.param_id = 305;
+  extra.a = a;
+  if (flat) {
+    extra.buffer = flat->data();
+    extra.size = static_cast<std::uint32_t>(flat->size());
+  }
+  EXPECT_EQ(Call(HX_CMD_CUSTOM_DATA_OP, nullptr, &extra), HX_ERR_NONE) << op;
+  return extra;
+}
+
+void StabilizerHost::SetDeletions(const analysis::effect::DeletedTrackPoints& deletions) {
+  if (!keeps_deletions_) {
+    HX_ParamDef param{};
+    param.disk_id = 305;
+    param.kind = HX_PARAM_ARBITRARY;
+    host.params.push_back(param);
+    PointAtParams();
+    keeps_deletions_ = true;
+  }
+  std::vector<char> flat(deletions.FlatSize());
+  deletions.Flatten(flat.data());
+  HX_Handle& value = deletions_param().u.arb_d.value;
+  if (value) DataOp(HX_DATA_DISPOSE, value);
+  value = DataOp(HX_DATA_UNFLATTEN, nullptr, &flat).out;
+}
+
+analysis::effect::DeletedTrackPoints StabilizerHost::Deletions() {
+  const HX_Handle value = deletions_param().u.arb_d.value;
+  std::vector<char> flat(DataOp(HX_DATA_FLAT_SIZE, value).size);
+  DataOp(HX_DATA_FLATTEN, value, &flat);
+  return {flat.data(), flat.size()};
 }
 
 void StabilizerHost::Set(std::int32_t index, double value) {

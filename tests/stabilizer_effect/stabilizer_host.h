@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "analysis/effect/deleted_track_points.h"
 #include "platform/hx/hx.h"
 #include "stabilizer/effect/src/parameter_table.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
@@ -69,6 +70,12 @@ class StabilizerHost {
   StabilizerEffect Effect();
   StabilizerState* state() { return Effect().GetState(); }
 
+  // A parameter behind the effect's own that holds deleted track points, as a host that keeps them
+  // has it; made when it is first set.
+  void SetDeletions(const analysis::effect::DeletedTrackPoints& deletions);
+  analysis::effect::DeletedTrackPoints Deletions();
+  HX_ParamDef& deletions_param() { return host.params.back(); }
+
   void Set(std::int32_t index, double value);
   double Value(std::int32_t index) const;
   bool Enabled(std::int32_t index) const;
@@ -95,7 +102,11 @@ class StabilizerHost {
   HX_Err RenderPlan(TestWorld& output, std::int32_t depth);
 
  private:
+  HX_CustomDataExtra DataOp(std::int32_t op, HX_Handle a, std::vector<char>* flat = nullptr);
+  void PointAtParams();
+
   std::vector<HX_ParamDef*> params_;
+  bool keeps_deletions_ = false;
   std::vector<HX_Handle> handles_;  // of instances set aside
 };
 

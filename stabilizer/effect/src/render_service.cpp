@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <vector>
 
+#include "analysis/effect/analysis_ui_data.h"
 #include "analysis/effect/banner.h"
 #include "analysis/effect/effect_parameters.h"
 #include "analysis/src/read_job_input.h"
@@ -225,7 +226,11 @@ void StabilizerEffect::RenderFrame() {
 void StabilizerEffect::Render(RenderFrames& frames, HX_World& output, std::int32_t depth,
                               bool may_warp) {
   const auto pass_through = [&] { CopyInput(context(), *frames.Input(), output, depth); };
-  if (IsOneByOne() || ShowsOverlay()) return pass_through();
+  if (IsOneByOne()) return pass_through();
+  if (ShowsOverlay()) {
+    pass_through();
+    return analysis::effect::AnalysisUIData(*this).Draw({}, {}, output);
+  }
   const StatusRecord record = GetStatusRecord();
   bool stabilized = false;
   if (may_warp && IsRenderableFrame()) {

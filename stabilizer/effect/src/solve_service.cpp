@@ -4,6 +4,7 @@
 #include <string>
 #include <utility>
 
+#include "analysis/effect/deletions_parameter.h"
 #include "analysis/effect/effect_parameters.h"
 #include "analysis/src/state_errors.h"
 #include "effect/host_requests.h"
@@ -101,9 +102,12 @@ void StabilizerEffect::CheckSolveParams(StabilizerState& state) {
   const ClipGeometry clip = state.Geometry();
   const SolverParamsRecord record = GetSolverParams(params, clip);
   const auto framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
+  const auto deletions = analysis::effect::ReadDeletedTrackPoints(*this);
   bool needed = state.needs_solve && state.has_frames();
   if (SolveHash(record) != state.solve_hash) {
     needed = true;
+  } else if (deletions && !state.WasSolvedWithout(*deletions)) {
+    needed = state.subsequent_solve = true;
   } else if (!needed && crops(framing)) {
     needed = CropHash(record) != state.crop_hash;
   } else if (!needed && status == Solver::finished) {
@@ -120,12 +124,12 @@ bool StabilizerEffect::StartSolveIfNeeded(StabilizerState& state) {
   if (!state.needs_solve || !state.has_frames()) return false;
   const EffectParameters params(*this);
   const ClipGeometry clip = state.Geometry();
-  const bool started =
-      state.StartSolve(GetSolverParams(params, clip), MarginInFrames(params, clip.frame_rate),
-                       [this]() -> boost::function<void()> {
-                         const auto notifier = boost::make_shared<const SolveNotifier>(context());
-                         return [notifier] { (*notifier)(); };
-                       });
+  const bool started = state.StartSolve(
+      GetSolverParams(params, clip), MarginInFrames(params, clip.frame_rate),
+      analysis::effect::ReadDeletedTrackPoints(*this), [this]() -> boost::function<void()> {
+        const auto notifier = boost::make_shared<const SolveNotifier>(context());
+        return [notifier] { (*notifier)(); };
+      });
   if (started && !state.first_analysis) ShowInfoText(context(), nullptr, nullptr);
   return started;
 }

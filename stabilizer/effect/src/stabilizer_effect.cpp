@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "analysis/effect/banner_cache.h"
+#include "analysis/effect/deletions_parameter.h"
 #include "analysis/effect/effect_parameters.h"
 #include "analysis/src/job_registry.h"
 #include "effect/effect_globals.h"
@@ -40,6 +41,11 @@ ParameterTexts& TextsOf(const HostContext& context) {
   return kept->texts;
 }
 
+// With the layer's.
+std::int32_t DeclaredParamCount() {
+  return ShowsExperimentalParameters() ? kParamCount : kFirstExperimentalIndex;
+}
+
 }  // namespace
 
 void StabilizerEffect::ShowAbout() {
@@ -56,7 +62,7 @@ void StabilizerEffect::StopPlugin() {
 }
 
 void StabilizerEffect::DeclareParams() {
-  DeclareParamCount(ShowsExperimentalParameters() ? kParamCount : kFirstExperimentalIndex);
+  DeclareParamCount(DeclaredParamCount());
 }
 
 HX_Err StabilizerEffect::AddParam(std::int32_t index) {
@@ -71,6 +77,8 @@ double StabilizerEffect::GetParamDefault(std::int32_t id) {
 }
 
 std::int32_t StabilizerEffect::ParamIdToIndex(std::int32_t id) {
+  // A host appends what it keeps of its own.
+  if (id == analysis::effect::kDeletedTrackPointsParam) return DeclaredParamCount();
   return kelp::effect::ParamIdToIndex(id);
 }
 

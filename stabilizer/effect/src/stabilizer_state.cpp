@@ -12,7 +12,14 @@
 namespace kelp::effect {
 
 using analysis::FrameStatus;
+using analysis::effect::DeletedTrackPoints;
 using marrow::stabilization::SolverParamsRecord;
+using marrow::tracking::AllFeatures;
+using tessel::utility::Guid;
+
+namespace {
+constexpr std::int64_t kNoParametersHash = std::int64_t{1} << 32;
+}  // namespace
 
 StabilizerState::StabilizerState(const HX_InData& in, bool keeps_jobs) {
   source_width = in.width;
@@ -68,27 +75,63 @@ bool StabilizerState::IsAtWorkOn(const Solver::Inputs& inputs) const {
 // back. A warper that was read from a project can't be given a wider map: it has no tracks.
 bool StabilizerState::MayReuseWarper(const Solver::Inputs& inputs) const {
   return warper && phase == SolvePhase::Solved && SolveHash(inputs.parameters) == solve_hash &&
-         solve_input_identity == result_identity &&
+         solve_input_identity == result_identity && deletion_identity == marked_deletions_ &&
          warper->frameCount() == inputs.features.frame_count &&
          static_cast<std::uint32_t>(warper->frameWidth()) == inputs.width &&
          static_cast<std::uint32_t>(warper->frameHeight()) == inputs.height &&
          (warper->driven() || inputs.frameMapRadius <= FrameMapRadius());
 }
 
+AllFeatures StabilizerState::Table() const {
+  AllFeatures table = all_features;
+  table.first_frame = first_frame;
+  return table;
+}
+
+AllFeatures StabilizerState::TableWithout(const DeletedTrackPoints& deletions) const {
+  AllFeatures table = all_features;
+  table.features = ApplyDeletedTrackPoints(Table(), deletions.Points()).features;
+  return table;
+}
+
+bool StabilizerState::WasSolvedWithout(const DeletedTrackPoints& deletions) {
+  const Guid identity = deletions.Identity();
+  if (identity == deletion_identity) return true;
+  if (!deletions_from_project_) return false;
+  const DeletedTrackPoints seeds(SeedsOf(Table(), deletions.Points()));
+  if (seeds.Identity() != deletion_identity) return false;
+  deletion_identity = marked_deletions_ = identity;
+  return true;
+}
+
+void StabilizerState::MakeResultIdentityUnique() {
+  AnalysisState::MakeResultIdentityUnique();
+  marked_deletions_ = Guid();
+}
+
 bool StabilizerState::StartSolve(const SolverParamsRecord& parameters,
                                  std::uint32_t frame_map_radius,
+                                 const std::optional<DeletedTrackPoints>& deletions,
                                  const boost::function<boost::function<void()>()>& make_notify) {
   const std::optional<Solver::State> status = SolveStatus();
   if (status == Solver::not_started) return false;
   const ClipGeometry clip = Geometry();
-  const Solver::Inputs inputs{clip.square_width(), clip.height, all_features,
-                              frame_map_radius,    parameters,  parameters.crop};
-  if ((status == Solver::running || status == Solver::failed) && IsAtWorkOn(inputs)) return false;
+  const Guid wanted = deletions ? deletions->Identity() : marked_deletions_;
+  const bool same_tracks = wanted == marked_deletions_;
+  const Solver::Inputs inputs{
+      clip.square_width(), clip.height, same_tracks ? all_features : TableWithout(*deletions),
+      frame_map_radius,    parameters,  parameters.crop};
+  if ((status == Solver::running || status == Solver::failed) && same_tracks &&
+      IsAtWorkOn(inputs)) {
+    return false;
+  }
 
   auto next = boost::make_shared<Solver>(inputs.width, inputs.height, inputs.features,
                                          inputs.frameMapRadius, inputs.parameters,
                                          inputs.needsCropper, make_notify());
   solver.reset();
+  all_features = inputs.features;
+  marked_deletions_ = wanted;
   if (MayReuseWarper(inputs)) next->SetExistingWarper(warper);
   next->Start();
   solver = std::move(next);
@@ -110,6 +153,8 @@ void StabilizerState::TakeSolve() {
   solve_hash = SolveHash(inputs.parameters);
   crop_hash = CropHash(inputs.parameters);
   solve_input_identity = result_identity;
+  deletion_identity = marked_deletions_;
+  deletions_from_project_ = false;
   needs_solve = false;
   subsequent_solve = false;
   solver.reset();
@@ -209,6 +254,8 @@ SavedState StabilizerState::Save() const {
   saved.needs_solve = needs_solve;
   saved.phase = phase;
   saved.solve_hash = solve_hash;
+  // The table tells of other deletions than the warps are of.
+  if (deletion_identity != marked_deletions_) saved.solve_hash = kNoParametersHash;
   saved.crop_hash = crop_hash;
   if (phase == SolvePhase::Solved) {
     saved.warper = warper;
@@ -241,6 +288,9 @@ void StabilizerState::Load(const SavedState& saved, const analysis::JobFactory& 
   crop = saved.crop;
   MakeResultIdentityUnique();
   solve_input_identity = result_identity;
+  deletion_identity = marked_deletions_ =
+      DeletedTrackPoints(marrow::tracking::DeletedSeeds(Table())).Identity();
+  deletions_from_project_ = true;
 }
 
 RenderSettings GetRenderSettings(const ParameterReader& params) {

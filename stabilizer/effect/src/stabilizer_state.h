@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <optional>
 
+#include "analysis/effect/deleted_track_points.h"
 #include "analysis/src/analysis_state.h"
 #include "analysis/src/state_errors.h"
 #include "analysis/src/validity.h"
@@ -34,6 +35,9 @@ class StabilizerState final : public analysis::AnalysisState {
   // A Solver is at work.
   bool IsWorkingOnResults() const override;
 
+  // No track of the new results is deleted.
+  void MakeResultIdentityUnique() override;
+
   bool has_frames() const { return all_features.frame_count > 0; }
   // Of the analysed source. No frames a second without a job input.
   ClipGeometry Geometry() const;
@@ -46,13 +50,19 @@ class StabilizerState final : public analysis::AnalysisState {
   // Starts a Solver on the stored analysis, unless one is at work on just that or waits for its
   // thread; whether it did. One at work on other inputs is dropped. Where the stored warps fit,
   // only the frame map and the crop are made anew. make_notify gives what the Solver calls at its
-  // end; what it throws leaves everything as it was.
+  // end; what it throws leaves everything as it was. The tracks of the deletions are left out and
+  // marked in all_features; without a set, those stay deleted that are.
   bool StartSolve(const marrow::stabilization::SolverParamsRecord& parameters,
                   std::uint32_t frame_map_radius,
+                  const std::optional<analysis::effect::DeletedTrackPoints>& deletions,
                   const boost::function<boost::function<void()>()>& make_notify);
   // Takes the results of the Solver, which has finished or failed, and what they were made from;
   // the Solver goes. A failed one leaves no results.
   void TakeSolve();
+
+  // Whether these deletions are what the stored solve was made with. A project tells it by the
+  // tracks that it meant, so that any points on just those tracks will do until the next solve.
+  bool WasSolvedWithout(const analysis::effect::DeletedTrackPoints& deletions);
 
   // Frames on either side that the frame map reaches.
   std::uint32_t FrameMapRadius() const;
@@ -100,6 +110,15 @@ class StabilizerState final : public analysis::AnalysisState {
  private:
   bool IsAtWorkOn(const Solver::Inputs& inputs) const;
   bool MayReuseWarper(const Solver::Inputs& inputs) const;
+  // all_features by absolute frames.
+  marrow::tracking::AllFeatures Table() const;
+  marrow::tracking::AllFeatures TableWithout(
+      const analysis::effect::DeletedTrackPoints& deletions) const;
+
+  // Identity of the deletions that are marked in all_features, which are those of the Solver at
+  // work; deletion_identity is of the ones that the stored solve was made with.
+  tessel::utility::Guid marked_deletions_;
+  bool deletions_from_project_ = false;
 };
 
 // How the parameters ask for frames to be drawn.
