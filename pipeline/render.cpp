@@ -5,6 +5,7 @@
 #include "pipeline/host_operations.h"
 #include "pipeline/pictures.h"
 #include "pipeline/stabilize.h"
+#include "stabilizer/effect/src/render_rules.h"
 #include "stabilizer/render/cp_warper_warps.h"
 #include "stabilizer/render/frame_renderer.h"
 
@@ -25,15 +26,6 @@ class ClipSource final : public SourceFrames<Pixel> {
  private:
   PictureReader<Pixel> reader_;
 };
-
-RenderSettings SettingsOf(const kelp::effect::Controls& controls) {
-  RenderSettings settings;
-  settings.framing = controls.framing;
-  settings.action_safe = static_cast<float>(controls.action_safe_margin / 100.0);
-  settings.maximum_scale = static_cast<float>(controls.maximum_scale / 100.0);
-  settings.additional_scale = static_cast<float>(controls.additional_scale / 100.0);
-  return settings;
-}
 
 // Copies the part of `from` that lies in `to`, whose top left is at (origin_x, origin_y) of `from`;
 // the rest is cleared.
@@ -58,7 +50,7 @@ class PictureRenderer {
       : sources_(reader),
         warps_(solution.warper),
         crop_(solution.crop),
-        settings_(SettingsOf(controls)),
+        settings_(kelp::effect::MakeRenderSettings(controls, GeometryOf(reader.info()))),
         renderer_(MakeRenderer(warps_, 1.0f / GeometryOf(reader.info()).pixel_aspect(), 1.0f)),
         rect_(setupOutputRect(settings_.framing, renderer_, reader.info().width,
                               reader.info().height)),
