@@ -17,6 +17,17 @@ bool is_open(const WorldX<Pixel>& world, const pixel_rect& rect) {
   return false;
 }
 
+// A rounded sample may keep its colours without any alpha. Composing leaves none of them.
+template <class Pixel>
+void clear_hidden_colours(WorldX<Pixel>& world, const pixel_rect& rect) {
+  for (int y = rect.top; y < rect.bottom; ++y) {
+    Pixel* row = world.row(y);
+    for (int x = rect.left; x < rect.right; ++x) {
+      if (row[x].alpha == 0) row[x] = {};
+    }
+  }
+}
+
 // The part of a buffer that a rectangle covers.
 template <class Pixel>
 WorldX<Pixel> part_of(WorldX<Pixel>& world, const pixel_rect& rect) {
@@ -55,12 +66,17 @@ void synthesizeEdges(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
   const std::int64_t range =
       std::min(pass.settings.synthesis_range, std::max(frame, count - 1 - frame));
   std::optional<WorldX<Pixel>> layer;
+  bool composes = false;
   for (std::int64_t k = 1; k <= range && !open.empty(); k = k > 0 ? -k : 1 - k) {
     const std::int64_t M = frame + k;
     if (M < 0 || M >= count) continue;
     const std::optional<FrameMesh> mesh =
         meshOfFrame(pass, static_cast<std::size_t>(M), output.width(), output.height());
     if (!mesh) continue;
+    if (!composes) {
+      for (const pixel_rect& part : open.rects()) clear_hidden_colours(output, part);
+      composes = true;
+    }
     TileMap shown = mesh->tiles();
     shown.intersect(open);
     const std::vector<pixel_rect> parts = shown.rects();
