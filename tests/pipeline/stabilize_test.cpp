@@ -195,8 +195,7 @@ TEST(StabilizeTest, EdgesAreFilledWithWhatIsThere) {
   EXPECT_GT(uncovered, pixels * kFrames / 50);
   EXPECT_LT(left_open, uncovered / 4);
   ASSERT_GT(compared, uncovered / 2);
-              -10 * std::log10(error / compared));
-              EXPECT_GT(-10 * std::log10(error / compared), 30);
+  EXPECT_GT(-10 * std::log10(error / compared), 30);
 }
 
 TEST(StabilizeTest, EachFieldOfAnInterlacedClipHasItsOwnMotion) {
