@@ -11,12 +11,12 @@
 #include "pipeline/host_operations.h"
 #include "platform/tessel/threads.h"
 
-// Milliseconds a frame whose edges are filled from 15 neighbours on each side, in a shot whose
-// frames lie up to `shake` pixels off their place and are turned by up to half a degree. Beside it,
-// turn by turn in the same run, the same frame drawn alone, without preparation. The counter
-// `renders` is how many of these it takes, median to median, where a plain loop takes 31 and 30
-// compositions; `prepare` and `compose` are the milliseconds that go into preparing sources and
-// into the host's transfers. Arguments: width, height, shake.
+// Milliseconds a frame, on one processor, whose edges are filled from 15 neighbours on each side,
+// in a shot whose frames lie up to `shake` pixels off their place and are turned by up to half a
+// degree. Beside it, turn by turn in the same run, the same frame drawn alone, without preparation.
+// The counter `renders` is how many of these it takes, median to median, where a plain loop takes
+// 31 and 30 compositions; `prepare` and `compose` are the milliseconds that go into preparing
+// sources and into the host's transfers. Arguments: width, height, shake.
 namespace {
 
 using marrow::stabilization::frame_bounds;
