@@ -1,10 +1,12 @@
 #include <algorithm>
 #include <boost/make_shared.hpp>
 #include <cstring>
+#include <map>
 
 #include "pipeline/host_operations.h"
 #include "pipeline/pictures.h"
 #include "pipeline/stabilize.h"
+#include "stabilizer/effect/src/render_rules.h"
 #include "stabilizer/render/cp_warper_warps.h"
 #include "stabilizer/render/frame_renderer.h"
 
@@ -12,28 +14,6 @@ namespace calmframe::pipeline {
 namespace {
 
 constexpr char kRendering[] = "rendering";
-
-template <class Pixel>
-class ClipSource final : public SourceFrames<Pixel> {
- public:
-  explicit ClipSource(media::ClipReader& reader) : reader_(reader) {}
-  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t picture) override {
-    return reader_.Read(picture);
-  }
-  const Pictures& pictures() const { return reader_.pictures(); }
-
- private:
-  PictureReader<Pixel> reader_;
-};
-
-RenderSettings SettingsOf(const kelp::effect::Controls& controls) {
-  RenderSettings settings;
-  settings.framing = controls.framing;
-  settings.action_safe = static_cast<float>(controls.action_safe_margin / 100.0);
-  settings.maximum_scale = static_cast<float>(controls.maximum_scale / 100.0);
-  settings.additional_scale = static_cast<float>(controls.additional_scale / 100.0);
-  return settings;
-}
 
 // Copies the part of `from` that lies in `to`, whose top left is at (origin_x, origin_y) of `from`;
 // the rest is cleared.
@@ -49,16 +29,44 @@ void CopyWindow(const WorldX<Pixel>& from, int origin_x, int origin_y, WorldX<Pi
   }
 }
 
+// Holds the pictures within `margin` of one that is rendered, so that renders in order read the
+// clip in order.
+template <class Pixel>
+class ClipSource final : public SourceFrames<Pixel> {
+ public:
+  ClipSource(media::ClipReader& reader, std::int64_t margin)
+      : reader_(reader), margin_(static_cast<std::size_t>(margin)) {}
+  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t picture) override {
+    if (margin_ == 0) return reader_.Read(picture);
+    boost::shared_ptr<const WorldX<Pixel>> world = held_[picture];
+    if (!world) {
+      const WorldX<Pixel>& read = *reader_.Read(picture);
+      const auto copy = boost::make_shared<WorldX<Pixel>>(read.width(), read.height());
+      CopyWindow(read, 0, 0, *copy);
+      world = held_[picture] = copy;
+    }
+    const std::size_t behind = std::min(picture, 2 * margin_);
+    held_.erase(held_.begin(), held_.lower_bound(picture - behind));
+    return world;
+  }
+  const Pictures& pictures() const { return reader_.pictures(); }
+
+ private:
+  PictureReader<Pixel> reader_;
+  const std::size_t margin_;
+  std::map<std::size_t, boost::shared_ptr<const WorldX<Pixel>>> held_;
+};
+
 // Renders pictures at the clip's size.
 template <class Pixel>
 class PictureRenderer {
  public:
   PictureRenderer(media::ClipReader& reader, const Solution& solution,
                   const kelp::effect::Controls& controls)
-      : sources_(reader),
+      : sources_(reader, kelp::effect::MakeMargin(controls, GeometryOf(reader.info()))),
         warps_(solution.warper),
         crop_(solution.crop),
-        settings_(SettingsOf(controls)),
+        settings_(kelp::effect::MakeRenderSettings(controls, GeometryOf(reader.info()))),
         renderer_(MakeRenderer(warps_, 1.0f / GeometryOf(reader.info()).pixel_aspect(), 1.0f)),
         rect_(setupOutputRect(settings_.framing, renderer_, reader.info().width,
                               reader.info().height)),

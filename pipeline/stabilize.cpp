@@ -6,6 +6,7 @@
 
 #include "pipeline/clip_frame_source.h"
 #include "pipeline/pictures.h"
+#include "stabilizer/effect/src/render_rules.h"
 #include "stabilizer/effect/src/solver.h"
 #include "tracking/tracking_run.h"
 
@@ -48,7 +49,8 @@ AllFeatures Analyze(media::ClipReader& reader, const Controls& controls, Listene
 
 Solution Solve(const AllFeatures& features, const ClipGeometry& clip, const Controls& controls,
                Listener& listener) {
-  Solver solver(clip.square_width(), clip.height, features, 0, MakeSolverParams(controls, clip),
+  Solver solver(clip.square_width(), clip.height, features,
+                kelp::effect::MakeMargin(controls, clip), MakeSolverParams(controls, clip),
                 crops(controls.framing));
   listener.Progress(kSolving, 0, 1, "");
   solver.Start();

@@ -26,8 +26,10 @@ enum : std::int32_t {
   kCropLessSmoothMore = 23,
   kHideWarningBanner = 26,
   kMethod = 28,
+  kSynthesisEdgeFeather = 35,
   kDetailedAnalysis = 36,
-  kRollingShutterRipple = 37
+  kRollingShutterRipple = 37,
+  kSynthesisInputRange = 38
 };
 
 using Choices = std::vector<std::pair<std::string, double>>;
@@ -65,9 +67,9 @@ void AddChoice(CLI::App& command, ControlFlags& flags, const std::string& flag,
       ->group("Controls");
 }
 
-void AddPercent(CLI::App& command, ControlFlags& flags, const std::string& flag,
-                std::int32_t disk_id, double least, double most, double default_value,
-                const std::string& description) {
+void AddNumber(CLI::App& command, ControlFlags& flags, const std::string& flag,
+               std::int32_t disk_id, const std::string& unit, double least, double most,
+               double default_value, const std::string& description) {
   // CLI::Range lets "nan" through.
   const auto check = [least, most](const std::string& text) {
     double number = 0;
@@ -82,7 +84,7 @@ void AddPercent(CLI::App& command, ControlFlags& flags, const std::string& flag,
       .add_option_function<double>(
           flag, [disk_id, &flags](double value) { flags.values[disk_id] = value; }, description)
       ->check(check)
-      ->type_name("PERCENT")
+      ->type_name(unit)
       ->default_str(shown.str())
       ->group("Controls");
 }
@@ -151,28 +153,32 @@ double ParseValue(const HX_ParamDef& param, const std::string& text) {
 void AddControlFlags(CLI::App& command, ControlFlags& flags) {
   AddChoice(command, flags, "--result", kResult, {{"smooth-motion", 1}, {"no-motion", 2}},
             "smooth-motion", "Keep the camera's motion but smooth, or hold it still");
-  AddPercent(command, flags, "--smoothness", kSmoothness, 0, 1000, 50,
-             "How much of the camera's motion is smoothed away");
+  AddNumber(command, flags, "--smoothness", kSmoothness, "PERCENT", 0, 1000, 50,
+            "How much of the camera's motion is smoothed away");
   AddChoice(
       command, flags, "--method", kMethod,
       {{"position", 1}, {"position-scale-rotation", 2}, {"perspective", 3}, {"subspace-warp", 4}},
       "subspace-warp", "What may be done to a frame");
   AddChoice(command, flags, "--framing", kFraming,
-            {{"stabilize-only", 1}, {"crop", 2}, {"crop-auto-scale", 3}}, "crop-auto-scale",
-            "What becomes of the moving edges");
-  AddPercent(command, flags, "--maximum-scale", kMaximumScale, 100, 10000, 150,
-             "Most that crop-auto-scale may enlarge");
-  AddPercent(command, flags, "--action-safe-margin", kActionSafeMargin, 0, 100, 0,
-             "Border that crop-auto-scale need not fill");
-  AddPercent(command, flags, "--additional-scale", kAdditionalScale, 0, 10000, 100,
-             "Scale applied on top");
+            {{"stabilize-only", 1}, {"crop", 2}, {"crop-auto-scale", 3}, {"synthesize-edges", 4}},
+            "crop-auto-scale", "What becomes of the moving edges");
+  AddNumber(command, flags, "--maximum-scale", kMaximumScale, "PERCENT", 100, 10000, 150,
+            "Most that crop-auto-scale may enlarge");
+  AddNumber(command, flags, "--action-safe-margin", kActionSafeMargin, "PERCENT", 0, 100, 0,
+            "Border that crop-auto-scale need not fill");
+  AddNumber(command, flags, "--additional-scale", kAdditionalScale, "PERCENT", 0, 10000, 100,
+            "Scale applied on top");
   AddSwitch(command, flags, "--detailed-analysis", kDetailedAnalysis,
             "Track more features; slower");
   AddChoice(command, flags, "--rolling-shutter-ripple", kRollingShutterRipple,
             {{"automatic", 1}, {"enhanced", 2}}, "automatic",
             "How hard the warp works against rolling shutter");
-  AddPercent(command, flags, "--crop-less-smooth-more", kCropLessSmoothMore, 0, 100, 50,
-             "Let the crop window follow less of the motion");
+  AddNumber(command, flags, "--crop-less-smooth-more", kCropLessSmoothMore, "PERCENT", 0, 100, 50,
+            "Let the crop window follow less of the motion");
+  AddNumber(command, flags, "--synthesis-input-range", kSynthesisInputRange, "SECONDS", 0, 999, 0.5,
+            "How far away in time synthesize-edges may take its pixels from");
+  AddNumber(command, flags, "--synthesis-edge-feather", kSynthesisEdgeFeather, "PIXELS", 0, 999, 10,
+            "How softly synthesize-edges joins frames at their edges");
   AddSwitch(command, flags, "--hide-warning-banner", kHideWarningBanner,
             "Draw no banner over frames that could not be steadied as asked");
   command.add_option("--param", flags.params, "Any parameter of `calmframe params`; repeatable")

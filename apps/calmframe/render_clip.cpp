@@ -1,7 +1,9 @@
 #include "apps/calmframe/render_clip.h"
 
 #include <algorithm>
+#include <cmath>
 #include <condition_variable>
+#include <cstdint>
 #include <cstring>
 #include <exception>
 #include <map>
@@ -12,6 +14,7 @@
 #include <vector>
 
 #include "apps/calmframe/failures.h"
+#include "host/effects/param_table.h"
 #include "host/effects/renderer.h"
 
 namespace calmframe {
@@ -133,6 +136,32 @@ void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer
   }
 }
 
+// Frames on either side that a render looks at.
+double NeighboursOf(SteadyClip& clip) {
+  constexpr std::int32_t kFraming = 22, kSynthesisInputRange = 38;  // disk ids
+  constexpr double kSynthesizeEdges = 4;
+  const auto value = [&clip](std::int32_t disk_id) {
+    const auto param = clip.effect().Param(clip.effect().IndexOf(disk_id));
+    return param ? host::ValueOf(*param).value_or(0.0) : 0.0;
+  };
+  const media::Ratio rate = clip.info().frame_rate;
+  return value(kFraming) == kSynthesizeEdges
+             ? std::round(value(kSynthesisInputRange) * static_cast<double>(rate.num) /
+                          static_cast<double>(rate.den))
+             : 0.0;
+}
+
+// Renders in order come back to the frames about them: a cache that holds these spares decoding the
+// clip anew from a key frame for each.
+void MakeRoomForNeighbours(SteadyClip& clip, int depth, int threads) {
+  constexpr double kMost = 2.0 * (1 << 30);
+  const double neighbours = NeighboursOf(clip);
+  if (neighbours == 0) return;
+  const double frame = static_cast<double>(clip.info().width) * clip.info().height * depth / 2;
+  const double frames = 2 * neighbours + threads + 4;
+  clip.host().media().SetCacheBytes(static_cast<std::size_t>(std::min(frames * frame, kMost)));
+}
+
 }  // namespace
 
 void RenderClip(SteadyClip& clip, const FrameRange& range, int depth, int threads,
@@ -141,6 +170,7 @@ void RenderClip(SteadyClip& clip, const FrameRange& range, int depth, int thread
   if (depth == 0) depth = info.bit_depth > 8 ? 16 : 8;
   if (threads == 0) threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
   constexpr int kMostInWork = 8;  // each holds some frames; the strips of one use all processors
+  MakeRoomForNeighbours(clip, depth, threads);
   RenderAhead frames(clip, range, depth, std::min(threads, kMostInWork));
   Progress shown{"rendering", 0, static_cast<double>(range.end - range.first), "frames", "", false};
   for (std::size_t frame = range.first; frame < range.end; ++frame) {

@@ -16,7 +16,10 @@ HX_Err CopyWorld(const HX_World& from, HX_World& to, const HX_Rect* from_rect,
 
 // Composes `from`, its top left at pixel (x, y) of `to`, clipped to it. With s in front of d:
 // a = as + ad (1 - as), c = (cs as + cd ad (1 - as)) / a, all zero where a is 0; the mode tells
-// which of both `from` is. Its alpha is scaled by the mode's opacity. Another mode is an error.
+// which of both `from` is. Its alpha is scaled by the mode's opacity. What needs no arithmetic is
+// exact: a pixel of `to` stays where `from` alone is clear, or is behind what is opaque; in one
+// format and at full opacity a pixel of `from` is taken as it is where it covers, or where `to` is
+// clear. Another mode is an error.
 HX_Err Transfer(const HX_World& from, const HX_TransferMode& mode, int x, int y, HX_World& to);
 
 // Gaussian of sigma radius / 2 on each of the four channels for itself, edges repeated; radius 0

@@ -1,6 +1,9 @@
 #include "stabilizer/render/frame_renderer.h"
 
+#include <utility>
+
 #include "platform/tessel/threads.h"
+#include "stabilizer/render/edge_synthesis.h"
 #include "stabilizer/render/strip_renderer.h"
 
 using marrow::stabilization::point2;
@@ -88,33 +91,41 @@ std::vector<float> outlinePolygon(const ClipWarps& warps, std::size_t frame,
 }
 
 template <class Pixel>
-void warpFrameInto(const VarVector& warp, const crop_rect& cropRect, double zoom,
-                   const RenderSettings& settings, const Renderer& renderer,
-                   const WorldX<Pixel>& source, WorldX<Pixel>& output) {
+std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>& pass, std::size_t M, int width,
+                                     int height) {
+  VarVector aligned;
+  const VarVector* warp = &aligned;
+  if (M == pass.frame) {
+    warp = &pass.warps.frameWarp(M);
+  } else if (!pass.warps.warpedGridOfFrame(M, pass.frame, aligned)) {
+    return std::nullopt;
+  }
+  const RenderSettings& settings = pass.settings;
   const bool crop = crops(settings.framing);
   const double shift_x = crop ? 0.0 : settings.shift_x / settings.additional_scale;
   const double shift_y = crop ? 0.0 : settings.shift_y / settings.additional_scale;
-  std::vector<double> vertices = warp.values;
+  std::vector<double> vertices = warp->values;
   for (std::size_t i = 0; i + 1 < vertices.size(); i += 2) {
-    vertices[i] = vertices[i] * renderer.scaleX - shift_x;
-    vertices[i + 1] = vertices[i + 1] * renderer.scaleY - shift_y;
+    vertices[i] = vertices[i] * pass.renderer.scaleX - shift_x;
+    vertices[i + 1] = vertices[i + 1] * pass.renderer.scaleY - shift_y;
   }
-  const StripRenderer<Pixel> strips(renderer, vertices, source, output, cropRect, zoom, crop);
+  return FrameMesh(pass.renderer, std::move(vertices), width, height, pass.cropRect, pass.zoom,
+                   crop);
+}
+
+template <class Pixel>
+void drawMesh(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>& output,
+              const TileMap* only) {
+  const StripRenderer<Pixel> strips(mesh, source, output, only);
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors([&strips](std::size_t band) { strips(band); },
                                                       strips.bands());
 }
 
 template <class Pixel>
 bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output) {
-  VarVector aligned;
-  const VarVector* warp = &aligned;
-  if (M == pass.frame) {
-    warp = &pass.warps.frameWarp(M);
-  } else if (!pass.warps.warpedGridOfFrame(M, pass.frame, aligned)) {
-    return false;
-  }
-  const boost::shared_ptr<const WorldX<Pixel>> source = pass.sources.Fetch(M);
-  warpFrameInto(*warp, pass.cropRect, pass.zoom, pass.settings, pass.renderer, *source, output);
+  const std::optional<FrameMesh> mesh = meshOfFrame(pass, M, output.width(), output.height());
+  if (!mesh) return false;
+  drawMesh(*mesh, *pass.sources.Fetch(M), output);
   return true;
 }
 
@@ -125,23 +136,29 @@ bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettin
   if (frame >= warps.frameCount()) return false;
   output.clear();
   const double zoom = GetZoom(warps, crop, settings, renderer);
+  const bool synthesizes = settings.framing == Framing::synthesize_edges;
+  PreparedSources<Pixel> prepared(sources, scaledEdges(settings.edges, renderer.scaleX), frame);
+  SourceFrames<Pixel>& drawn =
+      synthesizes && settings.edges.any() ? static_cast<SourceFrames<Pixel>&>(prepared) : sources;
   const FramePass<Pixel> pass{warps,
                               settings,
                               renderer,
-                              sources,
+                              drawn,
                               operations,
                               frame,
                               scaled_crop(crop, crops(settings.framing), frame, renderer),
                               zoom};
-  return drawFrame(pass, frame, output);
+  drawFrame(pass, frame, output);
+  if (synthesizes) synthesizeEdges(pass, output);
+  return true;
 }
 
-#define CALMFRAME_INSTANTIATE(Pixel)                                                             \
-  template void warpFrameInto(const VarVector&, const crop_rect&, double, const RenderSettings&, \
-                              const Renderer&, const WorldX<Pixel>&, WorldX<Pixel>&);            \
-  template bool drawFrame(const FramePass<Pixel>&, std::size_t, WorldX<Pixel>&);                 \
-  template bool renderFrame(const ClipWarps&, const cropper*, const RenderSettings&, Renderer&,  \
-                            std::size_t, SourceFrames<Pixel>&, WorldOperations<Pixel>&,          \
+#define CALMFRAME_INSTANTIATE(Pixel)                                                              \
+  template std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>&, std::size_t, int, int);  \
+  template void drawMesh(const FrameMesh&, const WorldX<Pixel>&, WorldX<Pixel>&, const TileMap*); \
+  template bool drawFrame(const FramePass<Pixel>&, std::size_t, WorldX<Pixel>&);                  \
+  template bool renderFrame(const ClipWarps&, const cropper*, const RenderSettings&, Renderer&,   \
+                            std::size_t, SourceFrames<Pixel>&, WorldOperations<Pixel>&,           \
                             WorldX<Pixel>&);
 CALMFRAME_INSTANTIATE(HX_Pixel8)
 CALMFRAME_INSTANTIATE(HX_Pixel16)

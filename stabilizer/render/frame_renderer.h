@@ -3,11 +3,15 @@
 #include <boost/shared_ptr.hpp>
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <vector>
 
 #include "stabilization/cropper.h"
 #include "stabilization/var_vector.h"
+#include "stabilizer/render/edge_preparation.h"
+#include "stabilizer/render/frame_mesh.h"
 #include "stabilizer/render/renderer.h"
+#include "stabilizer/render/source_frames.h"
 #include "stabilizer/render/world.h"
 
 // The popup's values.
@@ -39,22 +43,14 @@ class ClipWarps {
   virtual std::int32_t gridRows() const = 0;
 };
 
-// Where source frames come from: the analysed clip's frame `frame`, at the render's scale. Failures
-// are thrown and leave the render.
-template <class Pixel>
-class SourceFrames {
- public:
-  virtual ~SourceFrames() = default;
-  virtual boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) = 0;
-};
-
 // What a render has its host do on frame buffers. Failures are thrown and leave the render.
 template <class Pixel>
 class WorldOperations {
  public:
   virtual ~WorldOperations() = default;
   // Composes `from`, its top left at pixel (x, y) of `to`, behind what `to` holds: what is opaque
-  // there stays, what is transparent is filled.
+  // there stays, what is transparent is filled. Where `from` is transparent nothing
+  // changes but colours without alpha, which become 0.
   virtual void TransferBehind(const WorldX<Pixel>& from, int x, int y, WorldX<Pixel>& to) = 0;
   // All four channels, edges repeated; radius in pixels; both worlds are of one size.
   virtual void Blur(const WorldX<Pixel>& from, WorldX<Pixel>& to, float radius) = 0;
@@ -69,6 +65,10 @@ struct RenderSettings {
   // output's origin plus the setup's.
   double shift_x = 0.0;
   double shift_y = 0.0;
+  // For synthesize_edges alone.
+  std::int64_t synthesis_range = 0;  // frames on each side
+  EdgeSettings edges{};
+  double alpha_boost = 1.0;  // see synthesizeEdges
 };
 
 // The renderer of a clip at a render scale; see Renderer.
@@ -101,13 +101,6 @@ std::vector<float> outlinePolygon(const ClipWarps& warps, std::size_t frame,
                                   const Renderer& renderer, const RenderSettings& settings,
                                   double setupOriginX, double setupOriginY);
 
-// Draws a frame of `source` through a record over what `output` holds. The strips run on all
-// processors; their number never shows in the result.
-template <class Pixel>
-void warpFrameInto(const marrow::stabilization::VarVector& warp, const crop_rect& cropRect,
-                   double zoom, const RenderSettings& settings, const Renderer& renderer,
-                   const WorldX<Pixel>& source, WorldX<Pixel>& output);
-
 // The render of one frame, as its passes share it. All referents outlive it.
 template <class Pixel>
 struct FramePass {
@@ -121,8 +114,20 @@ struct FramePass {
   double zoom;
 };
 
-// Draws source frame M over what `output` holds, by its own record where it is the pass's frame,
-// else as it lies in that frame's output. False, with nothing fetched, where no motion is known.
+// Source frame M's mesh in an output of width x height pixels: by its own record where it is the
+// pass's frame, else as it lies in that frame's output. Nothing where no motion is known.
+template <class Pixel>
+std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>& pass, std::size_t M, int width,
+                                     int height);
+
+// Draws a frame through its mesh over what `output` holds; with `only`, at least what lies in those
+// tiles. The strips run on all processors; their number never shows in the result.
+template <class Pixel>
+void drawMesh(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>& output,
+              const TileMap* only = nullptr);
+
+// Draws source frame M over what `output` holds. False, with nothing fetched, where no motion is
+// known.
 template <class Pixel>
 bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output);
 

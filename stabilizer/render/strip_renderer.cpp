@@ -13,15 +13,7 @@ namespace {
 // Tall enough that few cells are set up twice, low enough to keep many processors busy.
 constexpr std::int64_t band_rows = 64;
 
-constexpr double max_coordinate = 1e30;  // products of two stay finite
-
-bool usable(point2 p) {
-  return std::fabs(p.x) < max_coordinate && std::fabs(p.y) < max_coordinate;
-}
-
-std::int64_t whole(double v) {
-  return static_cast<std::int64_t>(std::clamp(std::isnan(v) ? 0.0 : v, -1e15, 1e15));
-}
+constexpr double flattest = 1e30;  // slope of an edge; a product with a coordinate stays finite
 
 // One directed edge of a quadrilateral; the inside lies where cross >= 0.
 struct edge {
@@ -67,7 +59,7 @@ struct edge {
 
 edge between(point2 a, point2 b) {
   const double slope = (b.x - a.x) / (b.y - a.y);
-  return {a, b.x - a.x, b.y - a.y, std::fabs(slope) < max_coordinate ? slope : 0.0};
+  return {a, b.x - a.x, b.y - a.y, std::fabs(slope) < flattest ? slope : 0.0};
 }
 
 }  // namespace
@@ -82,61 +74,36 @@ struct StripRenderer<Pixel>::cell {
 };
 
 template <class Pixel>
-StripRenderer<Pixel>::StripRenderer(const Renderer& renderer, const std::vector<double>& vertices,
-                                    const WorldX<Pixel>& source, WorldX<Pixel>& destination,
-                                    const crop_rect& cropRect, double zoom, bool crop)
-    : renderer_(renderer),
-      vertices_(vertices),
+StripRenderer<Pixel>::StripRenderer(const FrameMesh& mesh, const WorldX<Pixel>& source,
+                                    WorldX<Pixel>& destination, const TileMap* only)
+    : FrameMesh(mesh),
       destination_(destination),
+      only_(only),
       source_{reinterpret_cast<const unsigned char*>(source.data()),
               source.row_bytes(),
               source.width(),
               source.height(),
-              std::min(renderer.sourceWidth, source.width()) - 1.0001,
-              std::min(renderer.sourceHeight, source.height()) - 1.0001},
-      crop_(crop),
-      zoom_(zoom) {
-  const double cx = ((cropRect.right + renderer.boundsMinX) * zoom +
-                     (cropRect.left + renderer.boundsMinX) * zoom) /
-                    2;
-  const double cy = ((cropRect.bottom + renderer.boundsMinY) * zoom +
-                     (cropRect.top + renderer.boundsMinY) * zoom) /
-                    2;
-  const double hx = ((crop ? destination.width() : renderer.planeWidth) - 1) * 0.5;
-  const double hy = ((crop ? destination.height() : renderer.planeHeight) - 1) * 0.5;
-  to_destination_x_ = whole(hx) - whole(cx);
-  to_destination_y_ = whole(hy) - whole(cy);
-  offset_x_ = (cx - std::trunc(cx)) - (hx - std::trunc(hx));
-  offset_y_ = (cy - std::trunc(cy)) - (hy - std::trunc(hy));
-  limit_x_ = std::trunc(renderer.planeWidth * zoom);
-  limit_y_ = std::trunc(renderer.planeHeight * zoom);
-  tolerance2_ = std::max(4.0, 4.0 / (zoom * zoom));
+              std::min(renderer_.sourceWidth, source.width()) - 1.0001,
+              std::min(renderer_.sourceHeight, source.height()) - 1.0001},
+      band_height_(only ? TileMap::side : band_rows),
+      tolerance2_(std::max(4.0, 4.0 / (zoom_ * zoom_))) {
   for (int x = 0; x < destination.width(); ++x) {
-    test_x_.push_back(static_cast<double>(x - to_destination_x_) / zoom);
-  }
-  for (std::int32_t r = 0; r < renderer.rows; ++r) {
-    row_extent extent{std::numeric_limits<double>::infinity(),
-                      -std::numeric_limits<double>::infinity()};
-    for (std::int32_t c = 0; c < renderer.cols; ++c) {
-      const point2 p = vertex(c, r);
-      if (!usable(p)) continue;
-      extent = {std::min(extent.min_y, p.y), std::max(extent.max_y, p.y)};
-    }
-    extents_.push_back(extent);
+    test_x_.push_back(static_cast<double>(x - to_destination_x_) / zoom_);
   }
 }
 
 template <class Pixel>
 std::size_t StripRenderer<Pixel>::bands() const {
-  return static_cast<std::size_t>((destination_.height() + band_rows - 1) / band_rows);
+  return static_cast<std::size_t>((destination_.height() + band_height_ - 1) / band_height_);
 }
 
 template <class Pixel>
 void StripRenderer<Pixel>::operator()(std::size_t band) const {
-  const std::int64_t first = static_cast<std::int64_t>(band) * band_rows;
-  const std::int64_t end = std::min<std::int64_t>(first + band_rows, destination_.height());
+  const std::int64_t first = static_cast<std::int64_t>(band) * band_height_;
+  const std::int64_t end = std::min<std::int64_t>(first + band_height_, destination_.height());
   // A zoom of 0 shows nothing.
   if (!(zoom_ > 0) || source_.width < 1 || source_.height < 1) return;
+  if (only_ && !only_->touches(0, first, destination_.width(), end)) return;
   for (std::int32_t r = 0; r + 1 < renderer_.rows; ++r) drawGridRow(r, first, end);
 }
 
@@ -158,11 +125,8 @@ void StripRenderer<Pixel>::drawGridRow(std::int32_t r, std::int64_t first_row,
 template <class Pixel>
 void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t first_row,
                                     std::int64_t end_row) const {
-  const point2 p00 = vertex(c, r);
-  const point2 p10 = vertex(c + 1, r);
-  const point2 p01 = vertex(c, r + 1);
-  const point2 p11 = vertex(c + 1, r + 1);
-  if (!usable(p00) || !usable(p10) || !usable(p01) || !usable(p11)) return;
+  cell_bounds bounds;
+  if (!cellBounds(c, r, bounds)) return;
 
   const bool top = r == 0;
   const bool bottom = r == renderer_.rows - 2;
@@ -181,20 +145,21 @@ void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t
     window_y0 = std::max<std::int64_t>(window_y0, renderer_.outTop);
     window_y1 = std::min<std::int64_t>(window_y1, renderer_.outBottom);
   }
-  const double min_x = std::min({p00.x, p10.x, p01.x, p11.x});
-  const double max_x = std::max({p00.x, p10.x, p01.x, p11.x});
-  const double min_y = std::min({p00.y, p10.y, p01.y, p11.y});
-  const double max_y = std::max({p00.y, p10.y, p01.y, p11.y});
-  const std::int64_t x0 =
-      std::max(whole(std::floor(zoom_ * min_x - 1)), window_x0 - to_destination_x_);
-  const std::int64_t x1 = std::min(whole(std::min(std::ceil(zoom_ * max_x + 1), limit_x_)),
-                                   window_x1 - to_destination_x_);
-  const std::int64_t y0 =
-      std::max(whole(std::floor(zoom_ * min_y - 1)), window_y0 - to_destination_y_);
-  const std::int64_t y1 = std::min(whole(std::min(std::ceil(zoom_ * max_y + 1), limit_y_)),
-                                   window_y1 - to_destination_y_);
+  const std::int64_t x0 = std::max(bounds.x0, window_x0 - to_destination_x_);
+  const std::int64_t x1 = std::min(bounds.x1, window_x1 - to_destination_x_);
+  const std::int64_t y0 = std::max(bounds.y0, window_y0 - to_destination_y_);
+  const std::int64_t y1 = std::min(bounds.y1, window_y1 - to_destination_y_);
   if (x0 >= x1 || y0 >= y1) return;
+  // Whole cells: a span's samples depend on where it begins.
+  if (only_ && !only_->touches(x0 + to_destination_x_, y0 + to_destination_y_,
+                               x1 + to_destination_x_, y1 + to_destination_y_)) {
+    return;
+  }
 
+  const point2 p00 = vertex(c, r);
+  const point2 p10 = vertex(c + 1, r);
+  const point2 p01 = vertex(c, r + 1);
+  const point2 p11 = vertex(c + 1, r + 1);
   cell q;
   q.c = c;
   q.r = r;

@@ -3,9 +3,7 @@
 #include <cstdint>
 #include <vector>
 
-#include "stabilization/cropper.h"
-#include "stabilization/matrix3.h"
-#include "stabilizer/render/renderer.h"
+#include "stabilizer/render/frame_mesh.h"
 #include "stabilizer/render/sampling.h"
 #include "stabilizer/render/world.h"
 
@@ -16,13 +14,12 @@
 // it, in ascending order, so a pixel that several cells cover holds the last one's sample whatever
 // the number of threads, and no two bands write one pixel.
 template <class Pixel>
-class StripRenderer {
+class StripRenderer : FrameMesh {
  public:
-  // vertices: cols x rows pairs, scaled and shifted; crop: scaled, relative to the renderer's
-  // bounds. All referents must outlive this.
-  StripRenderer(const Renderer& renderer, const std::vector<double>& vertices,
-                const WorldX<Pixel>& source, WorldX<Pixel>& destination, const crop_rect& cropRect,
-                double zoom, bool crop);
+  // mesh: for a destination of that size. With `only`, tiles of the destination, their pixels are
+  // drawn as ever, and of the others some or none. All referents must outlive this.
+  StripRenderer(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>& destination,
+                const TileMap* only = nullptr);
 
   // How many bands the destination has; a band may be drawn on any thread.
   std::size_t bands() const;
@@ -30,36 +27,17 @@ class StripRenderer {
 
  private:
   struct cell;
-  struct row_extent {
-    double min_y;
-    double max_y;
-  };
 
   void drawGridRow(std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
   void drawCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
   void drawSpan(cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row) const;
-  marrow::stabilization::point2 vertex(std::int32_t c, std::int32_t r) const {
-    const std::size_t i =
-        2 * (static_cast<std::size_t>(r) * static_cast<std::size_t>(renderer_.cols) +
-             static_cast<std::size_t>(c));
-    return {vertices_[i], vertices_[i + 1]};
-  }
 
-  const Renderer& renderer_;
-  const std::vector<double>& vertices_;
   WorldX<Pixel>& destination_;
+  const TileMap* only_;
   source_plane source_;
-  bool crop_;
-  double zoom_;
-  std::int64_t to_destination_x_;  // destination = zoomed plane + this
-  std::int64_t to_destination_y_;
-  double offset_x_;  // sub-pixel part of the same
-  double offset_y_;
-  double limit_x_;  // of the zoomed plane
-  double limit_y_;
+  std::int64_t band_height_;
   double tolerance2_;
-  std::vector<double> test_x_;       // of each destination column, in the plane
-  std::vector<row_extent> extents_;  // of each grid row's finite vertices
+  std::vector<double> test_x_;  // of each destination column, in the plane
 };
 
 extern template class StripRenderer<HX_Pixel8>;

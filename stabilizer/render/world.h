@@ -14,23 +14,26 @@
 
 #include "platform/hx/hx_world.h"
 
-// The gil view of a frame of `Pixel`, and how the host calls its format.
+// The gil view of a frame of `Pixel`, how the host calls its format, and what is full.
 template <class Pixel>
 struct world_view;
 template <>
 struct world_view<HX_Pixel8> {
   using type = boost::gil::argb8_view_t;
   static constexpr std::uint32_t format = HX_FORMAT_ARGB8;
+  static constexpr std::uint8_t full = 255;
 };
 template <>
 struct world_view<HX_Pixel16> {
   using type = boost::gil::argb16_view_t;
   static constexpr std::uint32_t format = HX_FORMAT_ARGB16;
+  static constexpr std::uint16_t full = 32768;
 };
 template <>
 struct world_view<HX_PixelFloat> {
   using type = boost::gil::argb32f_view_t;
   static constexpr std::uint32_t format = HX_FORMAT_ARGBF;
+  static constexpr float full = 1.0f;
 };
 
 // A frame buffer: its own, or one that somebody else keeps alive.

@@ -132,6 +132,18 @@ INSTANTIATE_TEST_SUITE_P(
                controls.framing = Framing::stabilize_only;
              }),
              32},
+        Case{"SynthesizedEdges", "-c:v libx264 -crf 10",
+             "--framing synthesize-edges --synthesis-input-range 0.2 --synthesis-edge-feather 6",
+             With([](Controls& controls) {
+               controls.framing = Framing::synthesize_edges;
+               controls.synthesis_input_range = 0.2;
+               controls.synthesis_edge_feather = 6;
+             }),
+             8},
+        Case{"SynthesizedEdgesOfFields",
+             "-vf interlace=scan=tff:lowpass=off -c:v libx264 -crf 10 -flags +ildct+ilme",
+             "--framing synthesize-edges",
+             With([](Controls& controls) { controls.framing = Framing::synthesize_edges; }), 16},
         Case{"DetailedCropOnly", "-c:v libx264 -crf 10",
              "--detailed-analysis --framing crop --additional-scale 90 "
              "--rolling-shutter-ripple enhanced",

@@ -203,14 +203,17 @@ struct FakeHostCallbacks {
                          const void* mask, std::int32_t x0, std::int32_t y0, HX_World* to) {
     Lock lock(current->mutex_);
     if (current->Operate("transfer")) return FakeHost::kFault;
-    if (mode->mode != HX_TRANSFER_IN_FRONT || mode->opacity != 255 || mode->opacity_u16 != 32768 ||
-        mask) {
+    const bool behind = mode->mode == HX_TRANSFER_BEHIND;
+    if ((!behind && mode->mode != HX_TRANSFER_IN_FRONT) || mode->opacity != 255 ||
+        mode->opacity_u16 != 32768 || mode->random_seed != 0 || mode->rgb_only != 0 || mask) {
       return HX_ERR_UNKNOWN;
     }
     for (int y = std::max(0, -y0); y < from->height && y + y0 < to->height; ++y) {
       for (int x = std::max(0, -x0); x < from->width && x + x0 < to->width; ++x) {
+        const FakePixel source = LoadFakePixel(*from, x, y);
+        const FakePixel target = LoadFakePixel(*to, x + x0, y + y0);
         StoreFakePixel(*to, x + x0, y + y0,
-                       InFront(LoadFakePixel(*from, x, y), LoadFakePixel(*to, x + x0, y + y0)));
+                       behind ? InFront(target, source) : InFront(source, target));
       }
     }
     return HX_ERR_NONE;

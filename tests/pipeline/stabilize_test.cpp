@@ -150,6 +150,54 @@ TEST(StabilizeTest, ATremblingWallStandsStillAtEveryDepth) {
   EXPECT_TRUE(ears.warnings.empty());
 }
 
+// A camera that trembles before a wall and is held still: all steadied frames show one picture,
+// whose truth at a pixel is the mean of the frames that cover it themselves.
+TEST(StabilizeTest, EdgesAreFilledWithWhatIsThere) {
+  constexpr int kWidth = 320, kHeight = 240, kShake = 12, kFrames = 16;
+  DrawnClip clip = TremblingWall(kWidth, kHeight, kFrames, kShake);
+  kelp::effect::Controls controls;
+  controls.method = kelp::effect::Method::position;
+  controls.result = kelp::effect::Result::no_motion;
+  Ears ears;
+  const auto features = Analyze(clip, controls, ears);
+  const auto render = [&](Framing framing, KeptFrames& frames) {
+    controls.framing = framing;
+    const Solution solution = Solve(features, GeometryOf(clip.info()), controls, ears);
+    Render(clip, solution, controls, 8, frames, ears);
+  };
+  KeptFrames open(clip.info()), filled(clip.info());
+  render(Framing::stabilize_only, open);
+  render(Framing::synthesize_edges, filled);
+
+  const std::size_t pixels = kWidth * kHeight;
+  std::vector<double> truth(pixels);
+  std::vector<int> covers(pixels);
+  for (std::size_t f = 0; f < kFrames; ++f) {
+    for (std::size_t i = 0; i < pixels; ++i) {
+      if (open.alpha[f][i] < 1) continue;
+      truth[i] += open.green[f][i];
+      ++covers[i];
+    }
+  }
+  double error = 0;
+  std::size_t compared = 0, uncovered = 0, left_open = 0;
+  for (std::size_t f = 0; f < kFrames; ++f) {
+    for (std::size_t i = 0; i < pixels; ++i) {
+      if (open.alpha[f][i] > 0) continue;
+      ++uncovered;
+      left_open += filled.alpha[f][i] < 1;
+      if (filled.alpha[f][i] < 1 || covers[i] < 4) continue;
+      const double d = filled.green[f][i] - truth[i] / covers[i];
+      error += d * d;
+      ++compared;
+    }
+  }
+  EXPECT_GT(uncovered, pixels * kFrames / 50);
+  EXPECT_LT(left_open, uncovered / 4);
+  ASSERT_GT(compared, uncovered / 2);
+  EXPECT_GT(-10 * std::log10(error / compared), 30);
+}
+
 TEST(StabilizeTest, EachFieldOfAnInterlacedClipHasItsOwnMotion) {
   // The camera moves between the fields of a frame, so one warp for both would comb.
   DrawnClip fields = TremblingWall(320, 240, 60, 4);

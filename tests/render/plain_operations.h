@@ -17,6 +17,7 @@ class PlainOperations final : public WorldOperations<Pixel> {
         if (u + x < 0 || v + y < 0 || u + x >= to.width() || v + y >= to.height()) continue;
         const Pixel& back = from.row(v)[u];
         Pixel& front = to.row(v + y)[u + x];
+        if (back.alpha == 0 && front.alpha != 0) continue;
         const double front_alpha = front.alpha / kFull;
         const double behind = back.alpha / kFull * (1 - front_alpha);
         const double alpha = front_alpha + behind;

@@ -154,6 +154,82 @@ TEST_F(RenderServiceTest, DrawsTheWarpAtEveryDepthOnBothPaths) {
   EXPECT_EQ(test.host.Count("utility 7"), 4);
 }
 
+// Five frames whose union is (-6, -4) to (75, 50): a plane of 81 x 54, the layer at (8, 3) of it.
+// All show the same source: what a neighbour fills shows the source's column for its own shift.
+TEST_F(RenderServiceTest, EdgesAreFilledFromTheFramesAround) {
+  test.Solved(ShiftingWarper(kWidth, kHeight, {{0, 0}, {6, 2}, {-6, 3}, {12, -4}, {3, 0}}, 2), {});
+  test.RenderCopy();
+  SetFraming(Framing::synthesize_edges);
+  test.Set(kSynthesisInputRangeIndex, 0.08);  // 2 frames
+  test.Set(kSynthesisEdgeFeatherIndex, 0);
+  for (const std::int32_t depth : {8, 16, 32}) {
+    UseDepth(depth);
+    const double tolerance = depth == 8 ? 0.4 : 2e-3;
+    test.host.in.current_time = 2;
+    ASSERT_EQ(test.Plan({-100, -100, 100, 100}, depth), HX_ERR_NONE);
+    ASSERT_EQ(test.orders.size(), 5u);
+    TestWorld planned(81, 54, depth, -8, -3);
+    ASSERT_EQ(test.RenderPlan(planned, depth), HX_ERR_NONE);
+    // Plane x - 6: column 30 of the plane shows source 30 - 6 + 6 of frame 2, less half a pixel.
+    ExpectColumn(planned, 30, 20, 29.5, tolerance);
+    // Right of its 57 (and the border's two pixels) frame 3 comes first.
+    ExpectColumn(planned, 66, 20, 66 - 6 - 12 - 0.5, tolerance);
+    ExpectColumn(planned, 79, 20, 79 - 6 - 12 - 0.5, tolerance);
+    // Above its 3, too: frame 3 begins at -4.
+    EXPECT_NEAR(100 * planned.At(30, 3, 2), 3 - 0.5, tolerance);
+    EXPECT_NEAR(planned.At(0, 1, 0), 0, 0) << "no frame reaches there";
+    if (depth < 32) {
+      TestWorld direct(81, 54, depth, -8, -3);
+      ASSERT_EQ(RenderDirect(direct), HX_ERR_NONE);
+      EXPECT_TRUE(direct == planned);
+    }
+    // The first and the last frame have neighbours on one side.
+    for (const std::int32_t frame : {0, 4}) {
+      test.host.in.current_time = frame;
+      ASSERT_EQ(test.Plan({-100, -100, 100, 100}, depth), HX_ERR_NONE);
+      ASSERT_EQ(test.orders.size(), 3u);
+      TestWorld end(81, 54, depth, -8, -3);
+      ASSERT_EQ(test.RenderPlan(end, depth), HX_ERR_NONE);
+      const int shift = frame == 0 ? 6 : 12;  // of frames 1 and 3
+      ExpectColumn(end, 73, 20, 73 - 6 - shift - 0.5, tolerance);
+    }
+  }
+  EXPECT_EQ(test.layers_out, 0);
+}
+
+TEST_F(RenderServiceTest, FeatherAndCropsFollowTheHorizontalScaleAndTheBoostIsItsDefault) {
+  test.Solved(ShiftingWarper(kWidth, kHeight, {{0, 0}}), {});
+  test.RenderCopy();
+  SetFraming(Framing::synthesize_edges);
+  for (int y = 0; y < kHeight; ++y) {
+    for (int x = 0; x < kWidth; ++x) source_.Set(x, y, 0.5, 0.5);
+  }
+  test.Set(kSynthesisEdgeFeatherIndex, 0);
+  test.Set(kSynthesisTopIndex, 10);
+  test.Set(kSynthesisLeftIndex, 3);
+  TestWorld whole(63, 47, 8, 0, 0);
+  ASSERT_EQ(RenderDirect(whole), HX_ERR_NONE);
+  EXPECT_EQ(whole.At(30, 9, 0), 0);
+  EXPECT_EQ(whole.At(30, 10, 0), 1) << "half of an alpha, five times";
+  EXPECT_EQ(whole.At(2, 20, 0), 0);
+  EXPECT_EQ(whole.At(3, 20, 0), 1);
+  // Half the columns, all rows.
+  test.host.in.downsample_x = {1, 2};
+  TestWorld half(32, 47, 8, 0, 0);
+  ASSERT_EQ(RenderDirect(half), HX_ERR_NONE);
+  EXPECT_EQ(half.At(20, 4, 0), 0);
+  EXPECT_EQ(half.At(20, 5, 0), 1);
+  EXPECT_EQ(half.At(1, 20, 0), 0);
+  EXPECT_EQ(half.At(2, 20, 0), 1);
+  // Feathered: at the outermost pixel 5 times the middle of 2 / 11^2 and 8 / 11^2.
+  test.host.in.downsample_x = {1, 1};
+  test.Set(kSynthesisTopIndex, 0);
+  test.Set(kSynthesisLeftIndex, 0);
+  test.Set(kSynthesisEdgeFeatherIndex, 10);
+  ASSERT_EQ(RenderDirect(whole), HX_ERR_NONE);
+  EXPECT_NEAR(whole.At(1, 20, 0), 5 * 5 / 121.0, 5 / 255.0);
+}
+
 TEST_F(RenderServiceTest, NoSizeLeavesTheOutputClear) {
   Solve();
   SetFraming(Framing::stabilize_only);
@@ -213,8 +289,16 @@ TEST_F(RenderServiceTest, AOneByOneSourceIsPassedOn) {
 }
 
 TEST_F(RenderServiceTest, AFailingRenderGivesBackAllThatItTook) {
-  Solve();
-  SetFraming(Framing::stabilize_only);
+  test.Solved(ShiftingWarper(kWidth, kHeight, {{0, 0}, {10, 6}}, 1), {});
+  test.RenderCopy();
+  SetFraming(Framing::synthesize_edges);
+  // A neighbour that a plan ordered and the host then has not.
+  ASSERT_EQ(test.Plan({-100, -100, 100, 100}, 8), HX_ERR_NONE);
+  test.refused_layer = 1;
+  TestWorld refused(73, 53, 8, -4, -2);
+  EXPECT_EQ(test.RenderPlan(refused, 8), FakeHost::kFault);
+  EXPECT_EQ(test.layers_out, 0);
+  int transfers = 0;
   for (int n = 1; n < 500; ++n) {
     test.host.ForgetOperations();
     test.host.FailOperation(n);
@@ -224,7 +308,12 @@ TEST_F(RenderServiceTest, AFailingRenderGivesBackAllThatItTook) {
     const auto& operations = test.host.operations();
     if (operations.size() < static_cast<std::size_t>(n)) {
       test.host.FailOperation(0);
+      EXPECT_GE(transfers, 1);
       return;
+    }
+    if (operations[static_cast<std::size_t>(n) - 1].name == "transfer") {
+      EXPECT_EQ(code, FakeHost::kFault);
+      ++transfers;
     }
     // The render's end is the one call whose failure is nobody's business.
     if (operations[static_cast<std::size_t>(n) - 1].name == "utility 7") {

@@ -11,6 +11,7 @@
 #include "analysis/src/read_job_input.h"
 #include "effect/entry.h"
 #include "platform/tessel/threads.h"
+#include "stabilization/frame_map.h"
 #include "stabilizer/effect/src/solve_hash.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
 #include "tests/effect/fake_pixels.h"
@@ -82,7 +83,8 @@ AllFeatures ShakenTable(std::int32_t frames, std::int32_t slots) {
 }
 
 boost::shared_ptr<const CPWarper> ShiftingWarper(
-    int width, int height, const std::vector<marrow::stabilization::point2>& shifts) {
+    int width, int height, const std::vector<marrow::stabilization::point2>& shifts,
+    std::int32_t map_radius) {
   const auto warper =
       boost::make_shared<CPWarper>(static_cast<std::int32_t>(shifts.size()), width, height);
   for (const auto& shift : shifts) {
@@ -95,6 +97,17 @@ boost::shared_ptr<const CPWarper> ShiftingWarper(
     }
     warper->storeFrameWarp(record, false);
   }
+  marrow::stabilization::MtoNMap::entries_t entries;
+  const auto count = static_cast<std::int32_t>(shifts.size());
+  for (std::int32_t M = 0; M < count; ++M) {
+    for (std::int32_t N = std::max(M - map_radius, 0); N <= std::min(M + map_radius, count - 1);
+         ++N) {
+      const auto& shift = shifts[static_cast<std::size_t>(M)];
+      if (M != N) entries[{M, N}] = {1, 0, shift.x, 0, 1, shift.y, 0, 0, 1};
+    }
+  }
+  warper->setFrameMap(
+      boost::make_shared<marrow::stabilization::MtoNMap>(count, map_radius, std::move(entries)));
   return warper;
 }
 
@@ -319,11 +332,17 @@ HX_Err StabilizerHost::RenderPlan(TestWorld& output, std::int32_t depth) {
   HX_RenderExtra extra{};
   extra.request = {plan.request.rect, depth};
   extra.checkout_layer_pixels = [](HX_EffectRef, std::int32_t id, HX_World** world) {
-    if (current->orders.count(id) == 0) return HX_Err{FakeHost::kFault};
+    if (current->orders.count(id) == 0 || id == current->refused_layer) {
+      return HX_Err{FakeHost::kFault};
+    }
     *world = current->pixels;
+    ++current->layers_out;
     return HX_Err{HX_ERR_NONE};
   };
-  extra.checkin_layer_pixels = [](HX_EffectRef, std::int32_t) { return HX_Err{HX_ERR_NONE}; };
+  extra.checkin_layer_pixels = [](HX_EffectRef, std::int32_t) {
+    --current->layers_out;
+    return HX_Err{HX_ERR_NONE};
+  };
   extra.checkout_output = [](HX_EffectRef, HX_World** world) {
     *world = target;
     return HX_Err{HX_ERR_NONE};

@@ -22,8 +22,10 @@ HX_Err Entry(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef*
 marrow::tracking::AllFeatures ShakenTable(std::int32_t frames, std::int32_t slots);
 
 // One record a frame that moves the rest grid; solved, as far as anybody can tell.
+// With a map of that radius, each frame lies by its own shift in every other's output too.
 boost::shared_ptr<const marrow::stabilization::CPWarper> ShiftingWarper(
-    int width, int height, const std::vector<marrow::stabilization::point2>& shifts);
+    int width, int height, const std::vector<marrow::stabilization::point2>& shifts,
+    std::int32_t map_radius = 0);
 
 // A frame buffer of memory of its own.
 class TestWorld {
@@ -96,6 +98,8 @@ class StabilizerHost {
 
   // The planned path: what was ordered, id to time in seconds, and the pixels behind each order.
   std::map<std::int32_t, double> orders;
+  int layers_out = 0;  // checked out and not yet back
+  std::int32_t refused_layer = -1;
   HX_World* pixels = nullptr;
   HX_PlanExtra plan{};
   HX_Err Plan(const HX_Rect& request, std::int32_t depth);

@@ -108,6 +108,8 @@ ParameterValues ValuesOf(const Controls& controls) {
   values[kDetailedAnalysisIndex] = controls.detailed_analysis;
   values[kRollingShutterRippleIndex] = static_cast<int>(controls.rolling_shutter_ripple);
   values[kCropLessSmoothMoreIndex] = controls.crop_less_smooth_more;
+  values[kSynthesisInputRangeIndex] = controls.synthesis_input_range;
+  values[kSynthesisEdgeFeatherIndex] = controls.synthesis_edge_feather;
   return values;
 }
 

@@ -23,7 +23,9 @@ struct Controls {
   double additional_scale = 100;  // percent, 0 to 10000
   bool detailed_analysis = false;
   RollingShutterRipple rolling_shutter_ripple = RollingShutterRipple::automatic_reduction;
-  double crop_less_smooth_more = 50;  // percent, 0 to 100
+  double crop_less_smooth_more = 50;   // percent, 0 to 100
+  double synthesis_input_range = 0.5;  // seconds, 0 to 999
+  double synthesis_edge_feather = 10;  // pixels, 0 to 999
 };
 
 // The analysed clip, as the rules need it.

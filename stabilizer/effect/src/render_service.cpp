@@ -251,7 +251,8 @@ bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) 
   const auto frame = static_cast<std::size_t>(row);
   if (frame >= state.warper->frameWarpCount()) return false;
 
-  RenderSettings settings = GetRenderSettings(EffectParameters(*this));
+  const EffectParameters params(*this);
+  RenderSettings settings = GetRenderSettings(params);
   WorldX<Pixel> pixels = PixelsOf<Pixel>(output);
   if (!(settings.additional_scale > 0)) {  // a picture of no size
     pixels.clear();
@@ -260,6 +261,7 @@ bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) 
   const OutputRect setup = SetUpOutput();
   settings.shift_x = static_cast<double>(output.origin_x) + setup.origin_x;
   settings.shift_y = static_cast<double>(output.origin_y) + setup.origin_y;
+  settings.synthesis_range = MarginInFrames(params, state.Geometry().frame_rate);
   Renderer renderer = MakeRenderer(state);
   ClipFrames<Pixel> clip(frames, state.first_frame);
   HostOperations<Pixel> operations(context());

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <boost/make_shared.hpp>
-#include <cmath>
 #include <mutex>
 #include <utility>
 
@@ -291,25 +290,6 @@ void StabilizerState::Load(const SavedState& saved, const analysis::JobFactory& 
   deletion_identity = marked_deletions_ =
       DeletedTrackPoints(marrow::tracking::DeletedSeeds(Table())).Identity();
   deletions_from_project_ = true;
-}
-
-RenderSettings GetRenderSettings(const ParameterReader& params) {
-  RenderSettings settings;
-  settings.framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
-  settings.action_safe = static_cast<float>(params.GetFloatParam(kActionSafeMarginIndex) / 100.0);
-  settings.maximum_scale = static_cast<float>(params.GetFloatParam(kMaximumScaleIndex) / 100.0);
-  settings.additional_scale =
-      static_cast<float>(params.GetFloatParam(kAdditionalScaleIndex) / 100.0);
-  return settings;
-}
-
-std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate) {
-  if (static_cast<Framing>(params.GetPopupParam(kFramingIndex)) != Framing::synthesize_edges) {
-    return 0;
-  }
-  constexpr double kMost = 2147483647.0;
-  const double frames = std::round(params.GetFloatParam(kSynthesisInputRangeIndex) * frame_rate);
-  return frames > 0 ? static_cast<std::uint32_t>(std::min(frames, kMost)) : 0;
 }
 
 }  // namespace kelp::effect

@@ -12,6 +12,7 @@
 #include "effect/parameter_reader.h"
 #include "platform/hx/hx_effect.h"
 #include "stabilizer/effect/src/parameter_rules.h"
+#include "stabilizer/effect/src/render_rules.h"
 #include "stabilizer/effect/src/shared_data.h"
 #include "stabilizer/effect/src/solve_phase.h"
 #include "stabilizer/effect/src/solver.h"
@@ -120,11 +121,5 @@ class StabilizerState final : public analysis::AnalysisState {
   tessel::utility::Guid marked_deletions_;
   bool deletions_from_project_ = false;
 };
-
-// How the parameters ask for frames to be drawn.
-RenderSettings GetRenderSettings(const ParameterReader& params);
-
-// Synthesis Input Range in frames, halves away from zero; 0 unless the edges are synthesized.
-std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate);
 
 }  // namespace kelp::effect

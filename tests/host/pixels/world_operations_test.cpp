@@ -114,6 +114,79 @@ TEST(Transfer, ComposesAllFormatsClippedAsTheFormulaTells) {
   EXPECT_NE(Transfer(world.world(), {3, 0, 255, 0, 32768}, 0, 0, world.world()), 0);
 }
 
+// Longer and shorter runs of clear, opaque and other pixels; floats beyond any picture's.
+void FillRuns(WorldBuffer& buffer, unsigned seed) {
+  std::mt19937 random(seed);
+  std::uniform_real_distribution<double> value(0, 1);
+  const bool is_float = buffer.world().format == HX_FORMAT_ARGBF;
+  for (int y = 0; y < buffer.world().height; ++y) {
+    for (int x = 0; x < buffer.world().width;) {
+      const unsigned kind = random() % 4;
+      for (unsigned i = 1 + random() % (y % 2 ? 90 : 4); i > 0 && x < buffer.world().width; --i) {
+        const double alpha = kind == 0 ? 0 : kind == 1 ? 1 : value(random);
+        Put(buffer, x, y, {alpha, value(random), value(random), value(random)});
+        if (is_float && random() % 20 == 0) buffer.row<float>(y)[4 * x + 1] = 7;
+        if (is_float && random() % 50 == 0) buffer.row<float>(y)[4 * x] = random() % 2 ? -1 : 2;
+        ++x;
+      }
+    }
+  }
+}
+
+TEST(Transfer, RunsThatNeedNoArithmeticAreExactAndTheOthersAsPixelByPixel) {
+  const int width = 301, height = 20;
+  for (const std::uint32_t format : kFormats) {
+    for (const int mode : {HX_TRANSFER_BEHIND, HX_TRANSFER_IN_FRONT}) {
+      for (const bool full : {true, false}) {
+        SCOPED_TRACE(testing::Message() << format << " " << mode << " " << full);
+        WorldBuffer from(width, height, format, 12), to(width, height, format, 8);
+        WorldBuffer single(width, height, format);
+        FillRuns(from, 1);
+        FillRuns(to, 2);
+        FillRuns(single, 2);
+        const HX_TransferMode record = {mode, 0, static_cast<std::uint8_t>(full ? 255 : 100), 0,
+                                        static_cast<std::uint16_t>(full ? 32768 : 10000)};
+        ASSERT_EQ(Transfer(from.world(), record, 0, 0, to.world()), 0);
+        const bool is_float = format == HX_FORMAT_ARGBF;
+        const auto opacity =
+            static_cast<float>(full                                     ? 1.0
+                               : is_float || format == HX_FORMAT_ARGB16 ? 10000 / 32768.0
+                                                                        : 100 / 255.0);
+        for (int y = 0; y < height; ++y) {
+          for (int x = 0; x < width; ++x) {
+            const Colour s = Get(from, x, y), d = Get(single, x, y), found = Get(to, x, y);
+            if (d[0] != 0 && (s[0] == 0 || (d[0] == 1 && mode == HX_TRANSFER_BEHIND))) {
+              ASSERT_EQ(found, d);
+            } else if (full && s[0] > 0 &&
+                       (d[0] == 0 || (s[0] == 1 && mode == HX_TRANSFER_IN_FRONT))) {
+              ASSERT_EQ(found, s);
+            } else {
+              // In the floats of the formula.
+              float front[4], back[4];
+              for (int c = 0; c < 4; ++c) {
+                front[c] = static_cast<float>(mode == HX_TRANSFER_BEHIND ? d[c] : s[c]);
+                back[c] = static_cast<float>(mode == HX_TRANSFER_BEHIND ? s[c] : d[c]);
+              }
+              (mode == HX_TRANSFER_BEHIND ? back : front)[0] *= opacity;
+              const float behind = back[0] * (1.0f - front[0]), alpha = front[0] + behind;
+              Colour expected{alpha};
+              for (int c = 1; c < 4; ++c) {
+                expected[c] = (front[c] * front[0] + back[c] * behind) / alpha;
+              }
+              if (!(alpha > 0)) expected = {};
+              for (int c = 0; c < 4; ++c) {
+                ASSERT_NEAR(found[c], expected[c], is_float ? 0 : 0.5 / Full(format) + 1e-6)
+                    << x << " " << y << " " << c;
+              }
+            }
+          }
+        }
+        EXPECT_TRUE(to.PaddingIntact());
+      }
+    }
+  }
+}
+
 TEST(CopyWorld, MovesAndClipsWithoutChange) {
   WorldBuffer from(6, 4, HX_FORMAT_ARGB16, 4), to(5, 5, HX_FORMAT_ARGB16, 4);
   Fill(from, 3);

@@ -1,0 +1,44 @@
+#include "stabilizer/effect/src/render_rules.h"
+
+#include <algorithm>
+#include <cmath>
+
+namespace kelp::effect {
+
+RenderSettings GetRenderSettings(const ParameterReader& params) {
+  RenderSettings settings;
+  settings.framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
+  settings.action_safe = static_cast<float>(params.GetFloatParam(kActionSafeMarginIndex) / 100.0);
+  settings.maximum_scale = static_cast<float>(params.GetFloatParam(kMaximumScaleIndex) / 100.0);
+  settings.additional_scale =
+      static_cast<float>(params.GetFloatParam(kAdditionalScaleIndex) / 100.0);
+  const auto value = [&params](std::int32_t index) { return params.GetFloatParam(index); };
+  settings.edges = {value(kSynthesisLeftIndex), value(kSynthesisTopIndex),
+                    value(kSynthesisRightIndex), value(kSynthesisBottomIndex),
+                    value(kSynthesisEdgeFeatherIndex)};
+  settings.alpha_boost = value(kSynthesisAlphaBoostIndex);
+  return settings;
+}
+
+std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate) {
+  if (static_cast<Framing>(params.GetPopupParam(kFramingIndex)) != Framing::synthesize_edges) {
+    return 0;
+  }
+  constexpr double kMost = 2147483647.0;
+  const double frames = std::round(params.GetFloatParam(kSynthesisInputRangeIndex) * frame_rate);
+  return frames > 0 ? static_cast<std::uint32_t>(std::min(frames, kMost)) : 0;
+}
+
+RenderSettings MakeRenderSettings(const Controls& controls, const ClipGeometry& clip) {
+  const ParameterValues values = ValuesOf(controls);
+  RenderSettings settings = GetRenderSettings(TableReader(values, false));
+  settings.synthesis_range = MakeMargin(controls, clip);
+  return settings;
+}
+
+std::uint32_t MakeMargin(const Controls& controls, const ClipGeometry& clip) {
+  const ParameterValues values = ValuesOf(controls);
+  return MarginInFrames(TableReader(values, false), clip.frame_rate);
+}
+
+}  // namespace kelp::effect

@@ -1,0 +1,22 @@
+#pragma once
+
+#include <cstdint>
+
+#include "effect/parameter_reader.h"
+#include "stabilizer/effect/src/parameter_rules.h"
+#include "stabilizer/render/frame_renderer.h"
+
+// How parameters become the settings of a render.
+namespace kelp::effect {
+
+// How the parameters ask for frames to be drawn; the synthesis range is MarginInFrames's to tell.
+RenderSettings GetRenderSettings(const ParameterReader& params);
+
+// Synthesis Input Range in frames, halves away from zero; 0 unless the edges are synthesized.
+std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate);
+
+// The same of the controls, with the range; and the range alone.
+RenderSettings MakeRenderSettings(const Controls& controls, const ClipGeometry& clip);
+std::uint32_t MakeMargin(const Controls& controls, const ClipGeometry& clip);
+
+}  // namespace kelp::effect

@@ -1,0 +1,15 @@
+#pragma once
+
+#include <boost/shared_ptr.hpp>
+#include <cstddef>
+
+#include "stabilizer/render/world.h"
+
+// Where source frames come from: the analysed clip's frame `frame`, at the render's scale. Failures
+// are thrown and leave the render.
+template <class Pixel>
+class SourceFrames {
+ public:
+  virtual ~SourceFrames() = default;
+  virtual boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) = 0;
+};
