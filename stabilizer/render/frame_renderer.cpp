@@ -133,7 +133,9 @@ bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettin
                               frame,
                               scaled_crop(crop, crops(settings.framing), frame, renderer),
                               zoom};
-  return drawFrame(pass, frame, output);
+  if (!drawFrame(pass, frame, output)) return false;
+  deblurFrame(pass, output);
+  return true;
 }
 
 #define CALMFRAME_INSTANTIATE(Pixel)                                                             \

@@ -7,6 +7,7 @@
 
 #include "stabilization/cropper.h"
 #include "stabilization/var_vector.h"
+#include "stabilizer/render/deblur.h"
 #include "stabilizer/render/renderer.h"
 #include "stabilizer/render/world.h"
 
@@ -69,6 +70,7 @@ struct RenderSettings {
   // output's origin plus the setup's.
   double shift_x = 0.0;
   double shift_y = 0.0;
+  DeblurSettings deblur = {};
 };
 
 // The renderer of a clip at a render scale; see Renderer.
@@ -126,7 +128,8 @@ struct FramePass {
 template <class Pixel>
 bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output);
 
-// Clears the output and draws the stabilized frame. `crop` may be null. False, with nothing done,
+// Clears the output and draws the stabilized frame, deblurred where settings say so. `crop` may be
+// null. False, with nothing done,
 // where the clip has no record of the frame.
 template <class Pixel>
 bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettings& settings,
