@@ -47,7 +47,7 @@ struct scene_options {
   double bias = 0.0;   // even within those limits; frame 0 stays as it is
   // How long a frame's shutter is open, as a fraction of the time between frames, about the time
   // that locate and depth take for the frame's. Empty or 0: an instant.
-  std::function<double(int frame)> exposure;
+  std::function<double(int frame)> exposure = {};
   bool occluder = false;  // a board that crosses the view once, from left to right
   double haze = 150.0;    // metres in which all but 1/e of a thing fades into the distance
   std::uint64_t seed = 1;
