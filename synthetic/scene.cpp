@@ -339,13 +339,13 @@ std::vector<surface> scene::surfaces_at(double time) const {
   return all;
 }
 
-void scene::draw_rows(int frame, int first, int end, HX_Pixel8* pixels,
+void scene::draw_rows(int frame, double shift, int first, int end, HX_Pixel8* pixels,
                       std::size_t row_pixels) const {
   const int width = options_.width;
   // Which surfaces these rows may show. A bound is taken at both ends of the strip's time, with
   // room for what the camera does between.
-  const double early = row_time(frame, first - 1);
-  const double late = row_time(frame, end);
+  const double early = row_time(frame, first - 1) + shift;
+  const double late = row_time(frame, end) + shift;
   const std::vector<surface> world = surfaces_at(early);
   const std::vector<surface> later = options_.readout == 0 ? world : surfaces_at(late);
   std::vector<candidate> strip;
@@ -373,7 +373,7 @@ void scene::draw_rows(int frame, int first, int end, HX_Pixel8* pixels,
   const auto bias = static_cast<float>(changed ? options_.bias * frame_random.uniform(-1, 1) : 0);
 
   const auto set_row = [&](double y) {
-    const double t = row_time(frame, y);
+    const double t = row_time(frame, y) + shift;
     const camera_pose pose = path_.shaken(t);
     if (options_.occluder && options_.readout != 0) {
       const std::vector<surface> now = surfaces_at(t);
@@ -448,13 +448,40 @@ void scene::draw_rows(int frame, int first, int end, HX_Pixel8* pixels,
   }
 }
 
+// The mean of instants spread evenly over the time that the shutter is open.
+void scene::expose_rows(int frame, int first, int end, HX_Pixel8* pixels,
+                        std::size_t row_pixels) const {
+  const double open = options_.exposure ? options_.exposure(frame) : 0.0;
+  if (!(open > 0)) return draw_rows(frame, 0.0, first, end, pixels, row_pixels);
+  constexpr int instants = 24;
+  const auto columns = static_cast<std::size_t>(options_.width);
+  std::vector<std::array<int, 3>> sums(columns * static_cast<std::size_t>(end - first));
+  const auto at = [&](std::size_t i) -> HX_Pixel8& {
+    return pixels[(static_cast<std::size_t>(first) + i / columns) * row_pixels + i % columns];
+  };
+  for (int k = 0; k < instants; ++k) {
+    draw_rows(frame, open * ((k + 0.5) / instants - 0.5), first, end, pixels, row_pixels);
+    for (std::size_t i = 0; i < sums.size(); ++i) {
+      const HX_Pixel8& p = at(i);
+      sums[i] = {sums[i][0] + p.red, sums[i][1] + p.green, sums[i][2] + p.blue};
+    }
+  }
+  const auto mean = [](int sum) {
+    return static_cast<std::uint8_t>((sum + instants / 2) / instants);
+  };
+  for (std::size_t i = 0; i < sums.size(); ++i) {
+    at(i) = {255, mean(sums[i][0]), mean(sums[i][1]), mean(sums[i][2])};
+  }
+}
+
 void scene::render(int frame, HX_Pixel8* pixels, std::size_t row_pixels) const {
   const int strips = (options_.height + kStripRows - 1) / kStripRows;
   texture_of(material::road);  // made before the rows need it, not by the first of them
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
       [&](std::size_t strip) {
         const int first = static_cast<int>(strip) * kStripRows;
-        draw_rows(frame, first, std::min(first + kStripRows, options_.height), pixels, row_pixels);
+        expose_rows(frame, first, std::min(first + kStripRows, options_.height), pixels,
+                    row_pixels);
       },
       static_cast<std::size_t>(strips));
 }

@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <vector>
 
@@ -41,9 +42,12 @@ struct scene_options {
   int frame_count = 100;
   // Time from a frame's first row to its last, as a fraction of the time between frames.
   double readout = 0.0;
-  double noise = 0.0;     // deviation of each channel, 0 to 255
-  double gain = 0.0;      // each frame's values are multiplied by 1 +- gain and moved by +- bias,
-  double bias = 0.0;      // even within those limits; frame 0 stays as it is
+  double noise = 0.0;  // deviation of each channel, 0 to 255
+  double gain = 0.0;   // each frame's values are multiplied by 1 +- gain and moved by +- bias,
+  double bias = 0.0;   // even within those limits; frame 0 stays as it is
+  // How long a frame's shutter is open, as a fraction of the time between frames, about the time
+  // that locate and depth take for the frame's. Empty or 0: an instant.
+  std::function<double(int frame)> exposure = {};
   bool occluder = false;  // a board that crosses the view once, from left to right
   double haze = 150.0;    // metres in which all but 1/e of a thing fades into the distance
   std::uint64_t seed = 1;
@@ -79,7 +83,10 @@ class scene {
   std::optional<hit> cast(int frame, point2 pixel) const;
   std::optional<point2> project(const std::function<camera_pose(double)>& path, int frame,
                                 const vector3& world) const;
-  void draw_rows(int frame, int first, int end, HX_Pixel8* pixels, std::size_t row_pixels) const;
+  // As they are `shift` after the frame's time.
+  void draw_rows(int frame, double shift, int first, int end, HX_Pixel8* pixels,
+                 std::size_t row_pixels) const;
+  void expose_rows(int frame, int first, int end, HX_Pixel8* pixels, std::size_t row_pixels) const;
 
   std::vector<surface> surfaces_;
   camera_path path_;

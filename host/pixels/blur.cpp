@@ -5,8 +5,10 @@
 #include <vector>
 
 #include "host/pixels/pixel_rows.h"
+#include "host/pixels/symmetric_sum.h"
 #include "host/pixels/world_buffer.h"
 #include "host/pixels/world_operations.h"
+#include "platform/tessel/threads.h"
 
 namespace calmframe::host {
 namespace {
@@ -25,19 +27,75 @@ std::vector<float> HalfKernel(double sigma) {
   return kernel;
 }
 
-// result[i] over `count` pixels that lie `stride` pixels apart.
-void BlurLine(const float* line, int count, std::ptrdiff_t stride, const std::vector<float>& kernel,
-              float* result) {
-  const auto at = [&](int i) { return line + std::clamp(i, 0, count - 1) * stride * 4; };
-  for (int i = 0; i < count; ++i) {
-    for (int c = 0; c < 4; ++c) {
-      float sum = kernel[0] * at(i)[c];
-      for (int k = 1; k < static_cast<int>(kernel.size()); ++k) {
-        sum += kernel[static_cast<std::size_t>(k)] * (at(i - k)[c] + at(i + k)[c]);
-      }
-      result[i * stride * 4 + c] = sum;
+const std::uint8_t* RowOf(const HX_World& world, int y) {
+  return static_cast<const std::uint8_t*>(world.data) + std::ptrdiff_t{world.row_bytes} * y;
+}
+
+// The source's rows around one, as floats: each is read once as the middle moves down, and no more
+// than the kernel reaches are held.
+class RowWindow {
+ public:
+  RowWindow(const HX_World& from, int reach, std::size_t row_size)
+      : from_(from),
+        format_(FormatOf(from)),
+        reach_(reach),
+        held_(std::min(2 * std::int64_t{reach} + 1, std::int64_t{from.height})),
+        row_size_(row_size),
+        rows_(static_cast<std::size_t>(held_) * row_size),
+        taps_(2 * static_cast<std::size_t>(reach) + 1) {}
+
+  // The rows y - reach to y + reach, the first and the last repeated. y must not fall.
+  const float* const* Around(int y) {
+    const int end = std::min(y + reach_, from_.height - 1) + 1;
+    for (next_ = std::max(next_, y - reach_); next_ < end; ++next_) {
+      LoadRow(format_, RowOf(from_, next_), from_.width, Row(next_));
     }
+    for (int i = -reach_; i <= reach_; ++i) {
+      taps_[static_cast<std::size_t>(i + reach_)] = Row(std::clamp(y + i, 0, from_.height - 1));
+    }
+    return taps_.data();
   }
+
+ private:
+  float* Row(int y) { return &rows_[static_cast<std::size_t>(y % held_) * row_size_]; }
+
+  const HX_World& from_;
+  const std::uint32_t format_;
+  const int reach_;
+  const std::int64_t held_;
+  const std::size_t row_size_;
+  std::vector<float> rows_;
+  std::vector<const float*> taps_;
+  int next_ = 0;
+};
+
+void BlurRows(const HX_World& from, HX_World& to, const std::vector<float>& kernel, int first,
+              int end) {
+  const auto width = static_cast<std::size_t>(from.width);
+  const std::size_t reach = kernel.size() - 1;
+  const std::size_t row_size = PaddedForSum(4 * width);
+  RowWindow window(from, static_cast<int>(reach), row_size);
+  // A row blurred downwards, with its ends repeated as far as the kernel reaches.
+  std::vector<float> widened(8 * reach + row_size), blurred(row_size);
+  float* const down = &widened[4 * reach];
+  std::vector<const float*> shifted;
+  for (std::size_t i = 0; i <= 2 * reach; ++i) shifted.push_back(&widened[4 * i]);
+  for (int y = first; y < end; ++y) {
+    SymmetricSum(window.Around(y), kernel, 4 * width, down);
+    for (std::size_t i = 0; i < reach; ++i) {
+      std::copy_n(down, 4, &widened[4 * i]);
+      std::copy_n(down + 4 * (width - 1), 4, down + 4 * (width + i));
+    }
+    SymmetricSum(shifted.data(), kernel, 4 * width, blurred.data());
+    StoreRow(FormatOf(to), blurred.data(), to.width,
+             static_cast<std::uint8_t*>(to.data) + std::ptrdiff_t{to.row_bytes} * y);
+  }
+}
+
+bool Overlap(const HX_World& a, const HX_World& b) {
+  const auto* const a_begin = RowOf(a, 0);
+  const auto* const b_begin = RowOf(b, 0);
+  return a_begin < RowOf(b, b.height) && b_begin < RowOf(a, a.height);
 }
 
 }  // namespace
@@ -45,31 +103,24 @@ void BlurLine(const float* line, int count, std::ptrdiff_t stride, const std::ve
 HX_Err Blur(const HX_World& from, HX_World& to, float radius) {
   if (from.width != to.width || from.height != to.height) return HX_ERR_UNKNOWN;
   if (!(radius > 0.0f)) return CopyWorld(from, to, nullptr, nullptr);
-  const std::uint32_t from_format = FormatOf(from), to_format = FormatOf(to);
-  if (!from.data || !to.data || BytesPerPixel(from_format) == 0 || BytesPerPixel(to_format) == 0) {
+  if (!from.data || !to.data || from.width < 1 || from.height < 1 ||
+      BytesPerPixel(FormatOf(from)) == 0 || BytesPerPixel(FormatOf(to)) == 0) {
     return HX_ERR_UNKNOWN;
   }
-  const int width = from.width, height = from.height;
-  const std::size_t row_size = static_cast<std::size_t>(width) * 4;
-  std::vector<float> image(row_size * static_cast<std::size_t>(height)), across(image.size());
-  for (int y = 0; y < height; ++y) {
-    LoadRow(from_format,
-            static_cast<const std::uint8_t*>(from.data) + std::ptrdiff_t{from.row_bytes} * y, width,
-            &image[static_cast<std::size_t>(y) * row_size]);
+  if (Overlap(from, to)) {
+    WorldBuffer apart(from.width, from.height, FormatOf(from));
+    CopyWorld(from, apart.world(), nullptr, nullptr);
+    return Blur(apart.world(), to, radius);
   }
-  const std::vector<float> kernel = HalfKernel(radius / 2.0);
-  for (int y = 0; y < height; ++y) {
-    const std::size_t begin = static_cast<std::size_t>(y) * row_size;
-    BlurLine(&image[begin], width, 1, kernel, &across[begin]);
-  }
-  for (int x = 0; x < width; ++x) {
-    const std::size_t begin = static_cast<std::size_t>(x) * 4;
-    BlurLine(&across[begin], height, width, kernel, &image[begin]);
-  }
-  for (int y = 0; y < height; ++y) {
-    StoreRow(to_format, &image[static_cast<std::size_t>(y) * row_size], width,
-             static_cast<std::uint8_t*>(to.data) + std::ptrdiff_t{to.row_bytes} * y);
-  }
+  const std::vector<float> kernel = HalfKernel(std::min(radius, 20000.0f) / 2.0);
+  // A band reads what the kernel reaches above and below it once more.
+  const int band = std::max(64, 2 * static_cast<int>(kernel.size()));
+  tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+      [&](std::size_t i) {
+        const int first = static_cast<int>(i) * band;
+        BlurRows(from, to, kernel, first, std::min(first + band, from.height));
+      },
+      static_cast<std::size_t>((from.height - 1) / band + 1));
   return HX_ERR_NONE;
 }
 

@@ -1,6 +1,5 @@
 #include "host/pixels/pixel_rows.h"
 
-#include <array>
 #include <cstddef>
 #include <cstring>
 
@@ -9,30 +8,29 @@
 namespace calmframe::host {
 namespace {
 
-// Where alpha, red, green and blue stand in a pixel.
-constexpr std::array<int, 4> kAlphaFirst = {0, 1, 2, 3};
-constexpr std::array<int, 4> kBlueFirst = {3, 2, 1, 0};
+// Where a pixel's alpha, red, green and blue stand.
+enum class Order { alpha_first, blue_first };
 
-template <typename Channel>
-void Load(const void* pixels, int count, float full, const std::array<int, 4>& places, float* row) {
-  const auto* pixel = static_cast<const Channel*>(pixels);
-  for (int i = 0; i < count; ++i, pixel += 4, row += 4) {
-    for (std::size_t c = 0; c < 4; ++c) row[c] = static_cast<float>(pixel[places[c]]) / full;
+template <typename Channel, Order order>
+void Load(const void* pixels, int count, float full, float* row) {
+  const auto* const channels = static_cast<const Channel*>(pixels);
+  for (std::ptrdiff_t i = 0; i < std::ptrdiff_t{count} * 4; ++i) {
+    row[i] = static_cast<float>(channels[order == Order::alpha_first ? i : i ^ 3]) / full;
   }
 }
 
 template <typename Channel>
 Channel ToChannel(float value, float full) {
-  if (!(value > 0.0f)) return 0;
-  return static_cast<Channel>(value < 1.0f ? value * full + 0.5f : full);
+  const float positive = value > 0.0f ? value : 0.0f;
+  const float within = positive < 1.0f ? positive : 1.0f;
+  return static_cast<Channel>(static_cast<std::int32_t>(within * full + 0.5f));
 }
 
-template <typename Channel>
-void Store(const float* row, int count, float full, const std::array<int, 4>& places,
-           void* pixels) {
-  auto* pixel = static_cast<Channel*>(pixels);
-  for (int i = 0; i < count; ++i, pixel += 4, row += 4) {
-    for (std::size_t c = 0; c < 4; ++c) pixel[places[c]] = ToChannel<Channel>(row[c], full);
+template <typename Channel, Order order>
+void Store(const float* row, int count, float full, void* pixels) {
+  auto* const channels = static_cast<Channel*>(pixels);
+  for (std::ptrdiff_t i = 0; i < std::ptrdiff_t{count} * 4; ++i) {
+    channels[order == Order::alpha_first ? i : i ^ 3] = ToChannel<Channel>(row[i], full);
   }
 }
 
@@ -41,11 +39,11 @@ void Store(const float* row, int count, float full, const std::array<int, 4>& pl
 void LoadRow(std::uint32_t format, const void* pixels, int count, float* row) {
   switch (format) {
     case HX_FORMAT_ARGB8:
-      return Load<std::uint8_t>(pixels, count, 255.0f, kAlphaFirst, row);
+      return Load<std::uint8_t, Order::alpha_first>(pixels, count, 255.0f, row);
     case HX_FORMAT_BGRA8:
-      return Load<std::uint8_t>(pixels, count, 255.0f, kBlueFirst, row);
+      return Load<std::uint8_t, Order::blue_first>(pixels, count, 255.0f, row);
     case HX_FORMAT_ARGB16:
-      return Load<std::uint16_t>(pixels, count, 32768.0f, kAlphaFirst, row);
+      return Load<std::uint16_t, Order::alpha_first>(pixels, count, 32768.0f, row);
     default:
       std::memcpy(row, pixels, static_cast<std::size_t>(count) * sizeof(HX_PixelFloat));
   }
@@ -54,11 +52,11 @@ void LoadRow(std::uint32_t format, const void* pixels, int count, float* row) {
 void StoreRow(std::uint32_t format, const float* row, int count, void* pixels) {
   switch (format) {
     case HX_FORMAT_ARGB8:
-      return Store<std::uint8_t>(row, count, 255.0f, kAlphaFirst, pixels);
+      return Store<std::uint8_t, Order::alpha_first>(row, count, 255.0f, pixels);
     case HX_FORMAT_BGRA8:
-      return Store<std::uint8_t>(row, count, 255.0f, kBlueFirst, pixels);
+      return Store<std::uint8_t, Order::blue_first>(row, count, 255.0f, pixels);
     case HX_FORMAT_ARGB16:
-      return Store<std::uint16_t>(row, count, 32768.0f, kAlphaFirst, pixels);
+      return Store<std::uint16_t, Order::alpha_first>(row, count, 32768.0f, pixels);
     default:
       std::memcpy(pixels, row, static_cast<std::size_t>(count) * sizeof(HX_PixelFloat));
   }

@@ -149,6 +149,7 @@ bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettin
                               scaled_crop(crop, crops(settings.framing), frame, renderer),
                               zoom};
   drawFrame(pass, frame, output);
+  deblurFrame(pass, output);
   if (synthesizes) synthesizeEdges(pass, output);
   return true;
 }

@@ -8,6 +8,7 @@
 
 #include "stabilization/cropper.h"
 #include "stabilization/var_vector.h"
+#include "stabilizer/render/deblur.h"
 #include "stabilizer/render/edge_preparation.h"
 #include "stabilizer/render/frame_mesh.h"
 #include "stabilizer/render/renderer.h"
@@ -69,6 +70,7 @@ struct RenderSettings {
   std::int64_t synthesis_range = 0;  // frames on each side
   EdgeSettings edges{};
   double alpha_boost = 1.0;  // see synthesizeEdges
+  DeblurSettings deblur = {};
 };
 
 // The renderer of a clip at a render scale; see Renderer.
@@ -131,7 +133,8 @@ void drawMesh(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>&
 template <class Pixel>
 bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output);
 
-// Clears the output and draws the stabilized frame. `crop` may be null. False, with nothing done,
+// Clears the output and draws the stabilized frame, deblurred where settings say so. `crop` may be
+// null. False, with nothing done,
 // where the clip has no record of the frame.
 template <class Pixel>
 bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettings& settings,

@@ -218,6 +218,37 @@ TEST(SceneTest, RowsAreReadAtTheirTime) {
   }
 }
 
+TEST(SceneTest, AnOpenShutterBlursAlongTheMotionAlone) {
+  scene_options options = {.width = 160, .height = 90};
+  const scene sharp(wall(8), sliding(0.6), options);  // 10 pixels a frame
+  options.exposure = [](int frame) { return frame == 3 ? 1.0 : 0.0; };
+  const scene shot(wall(8), sliding(0.6), options);
+  const image still = draw(sharp, 2), same = draw(shot, 2);
+  EXPECT_EQ(std::memcmp(still.pixels.data(), same.pixels.data(), 160 * 90 * sizeof(HX_Pixel8)), 0);
+  const image a = draw(sharp, 3), b = draw(shot, 3);
+  const auto unrest = [](const image& of, int dx, int dy) {
+    double sum = 0;
+    for (int y = 8; y < 80; ++y) {
+      for (int x = 8; x < 150; ++x) sum += std::abs(of.luma(x + dx, y + dy) - of.luma(x, y));
+    }
+    return sum;
+  };
+  EXPECT_LT(unrest(b, 1, 0), 0.75 * unrest(a, 1, 0));
+  EXPECT_GT(unrest(b, 0, 1), 0.75 * unrest(a, 0, 1));
+  // The blur is the camera's way about the frame's time: a box of the pixels that it goes.
+  const double pixels = shot.camera().focal * 0.6 / 8;
+  double difference = 0, before = 0;
+  for (int y = 8; y < 80; ++y) {
+    for (int x = 8; x < 150; ++x) {
+      double box = 0;
+      for (int k = -7; k <= 7; ++k) box += a.luma(point2{x + pixels * k / 15, 1.0 * y}) / 15;
+      difference += std::abs(b.luma(x, y) - box);
+      before += std::abs(b.luma(x, y) - a.luma(x, y));
+    }
+  }
+  EXPECT_LT(difference, before / 4);
+}
+
 TEST(SceneTest, GainAndNoiseSpareTheGeometryAndTheFirstFrame) {
   const scene_options plain = {.width = 160, .height = 90};
   scene_options changed = plain;

@@ -5,6 +5,26 @@
 
 namespace kelp::effect {
 
+namespace {
+
+DeblurSettings GetDeblurSettings(const ParameterReader& params) {
+  DeblurSettings deblur;
+  if (!params.GetBoolParam(kDeblurIndex)) return deblur;
+  deblur.range = static_cast<std::int32_t>(params.GetFloatParam(kDeblurFrameRangeIndex));
+  deblur.frame_threshold = params.GetFloatParam(kDeblurFrameThresholdIndex);
+  deblur.comparison_blur = static_cast<float>(params.GetFloatParam(kDeblurComparisonBlurIndex));
+  const double threshold = params.GetFloatParam(kDeblurPixelThresholdIndex) / 100.0;
+  const double softness = params.GetFloatParam(kDeblurPixelSoftnessIndex) / 100.0;
+  deblur.pixel_threshold = static_cast<float>(threshold);
+  deblur.pixel_limit = static_cast<float>(threshold + softness);
+  deblur.show_map = params.GetBoolParam(kShowDeblurMapIndex);
+  deblur.debug = static_cast<DeblurDebug>(params.GetPopupParam(kDeblurDebugIndex));
+  deblur.aligned_frame = params.GetFloatParam(kAlignedFrameIndex);
+  return deblur;
+}
+
+}  // namespace
+
 RenderSettings GetRenderSettings(const ParameterReader& params) {
   RenderSettings settings;
   settings.framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
@@ -17,6 +37,7 @@ RenderSettings GetRenderSettings(const ParameterReader& params) {
                     value(kSynthesisRightIndex), value(kSynthesisBottomIndex),
                     value(kSynthesisEdgeFeatherIndex)};
   settings.alpha_boost = value(kSynthesisAlphaBoostIndex);
+  settings.deblur = GetDeblurSettings(params);
   return settings;
 }
 

@@ -132,11 +132,8 @@ void StabilizerEffect::PrepareFrame() {
 
 std::int64_t StabilizerEffect::PlanMargin(const StabilizerState& state) {
   const EffectParameters params(*this);
-  const std::int64_t deblur =
-      params.GetBoolParam(kDeblurIndex)
-          ? static_cast<std::int64_t>(params.GetFloatParam(kDeblurFrameRangeIndex))
-          : 0;
-  return std::max<std::int64_t>(MarginInFrames(params, state.Geometry().frame_rate), deblur);
+  return std::max<std::int64_t>(MarginInFrames(params, state.Geometry().frame_rate),
+                                deblurReach(GetRenderSettings(params).deblur));
 }
 
 FrameClock StabilizerEffect::ClockOf(const StabilizerState& state) {

@@ -281,6 +281,50 @@ TEST(Blur, IsAGaussianOfHalfTheRadiusWithEdgesRepeated) {
   }
 }
 
+// Sizes that a kernel, a band of rows or a vector doesn't divide, and kernels wider than a frame.
+TEST(Blur, IsTheSumOverItsSquareAtEveryPixel) {
+  const struct {
+    int width, height;
+    float radius;
+  } cases[] = {{37, 150, 5.3f}, {5, 3, 16.0f}, {1, 9, 2.0f}};
+  for (const auto& c : cases) {
+    WorldBuffer from(c.width, c.height, HX_FORMAT_ARGBF, 8), to(c.width, c.height, HX_FORMAT_ARGBF);
+    for (int y = 0; y < c.height; ++y) {
+      for (int x = 0; x < c.width; ++x) {
+        Put(from, x, y, {(x * 7 + y) % 5 / 4.0, (x * y) % 11 / 5.0 - 1, (x + 3 * y) % 7 / 6.0, 1});
+      }
+    }
+    const double sigma = c.radius / 2.0;
+    const int reach = static_cast<int>(std::ceil(3 * sigma));
+    const auto at = [&](int x, int y) {
+      return Get(from, std::clamp(x, 0, c.width - 1), std::clamp(y, 0, c.height - 1));
+    };
+    ASSERT_EQ(Blur(from.world(), to.world(), c.radius), 0);
+    for (int y = 0; y < c.height; ++y) {
+      for (int x = 0; x < c.width; x += 3) {
+        Colour sum{};
+        double weights = 0;
+        for (int v = -reach; v <= reach; ++v) {
+          for (int u = -reach; u <= reach; ++u) {
+            const double w = std::exp(-0.5 * (u * u + v * v) / (sigma * sigma));
+            const Colour p = at(x + u, y + v);
+            for (std::size_t i = 0; i < 4; ++i) sum[i] += w * p[i];
+            weights += w;
+          }
+        }
+        for (std::size_t i = 0; i < 4; ++i) {
+          ASSERT_NEAR(Get(to, x, y)[i], sum[i] / weights, 2e-6) << x << ", " << y;
+        }
+      }
+    }
+    EXPECT_TRUE(from.PaddingIntact());
+    ASSERT_EQ(Blur(from.world(), from.world(), c.radius), 0);
+    for (int y = 0; y < c.height; ++y) {
+      for (int x = 0; x < c.width; ++x) ASSERT_EQ(Get(from, x, y), Get(to, x, y)) << "in place";
+    }
+  }
+}
+
 TEST(ColourOfHls, LightnessIsTheBrightestComponent) {
   const auto colour = [](double hue, double lightness, double saturation) {
     const std::int32_t hls[3] = {static_cast<std::int32_t>(hue * 65536),
