@@ -12,6 +12,7 @@
 #include "host/media/clip.h"
 #include "pipeline/stabilize.h"
 #include "synthetic/scene.h"
+#include "tracking/color_pyramid.h"
 #include "tracking/feature_selector.h"
 #include "tracking/feature_tracker.h"
 #include "tracking/frame_preparation.h"
@@ -124,6 +125,10 @@ class MemorySource final : public FrameSource {
   void LoadLuma(std::size_t t, float* out) override { LumaFromArgb(Frame(t), out); }
   void LoadMask(std::size_t t, std::uint8_t* out) override { MaskFromArgb(Frame(t), out); }
   void LoadColor(std::size_t t, float* out) override { ColorFromArgb(Frame(t), out); }
+  void LoadColorPyramid(std::size_t t, ImagePyramid& pyramid,
+                        std::vector<float>& scratch) override {
+    ColorPyramidFromArgb(Frame(t), pyramid, scratch);
+  }
 
  private:
   static ArgbFrame Frame(std::size_t t) { return Input().Argb(FrameOfRun(t)); }
@@ -170,8 +175,7 @@ void Preparation(benchmark::State& state) {
       state, 1.5, 1,
       [&] {
         const ArgbFrame argb = in.Argb(frame());
-        ColorFromArgb(argb, pyramid.LevelData(0));
-        BuildLevels(pyramid, scratch);
+        ColorPyramidFromArgb(argb, pyramid, scratch);
         LumaFromArgb(argb, luma.data());
         MaskFromArgb(argb, mask.data());
       },
