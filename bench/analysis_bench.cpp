@@ -31,7 +31,7 @@ using kelp::effect::Controls;
 using side_by_side::Compare;
 
 constexpr std::size_t kFrames = 8;
-constexpr std::size_t kRun = 48;  // frames of a whole analysis: the same, there and back
+constexpr std::size_t kRun = 120;  // frames of a whole analysis: the same, there and back
 constexpr std::size_t kLevels = 5;
 
 struct Frames final {
@@ -324,7 +324,7 @@ BENCHMARK(Preparation<CV_8U>)->ROW->Iterations(41);
 BENCHMARK(Selector)->ROW->Iterations(41);
 BENCHMARK(Translation)->ROW->Iterations(41);
 BENCHMARK(Verification)->ROW->Iterations(41);
-BENCHMARK(WholeAnalysis)->ROW->Iterations(5);
-BENCHMARK(DetailedAnalysis)->ROW->Iterations(5);
+BENCHMARK(WholeAnalysis)->ROW->Iterations(3);
+BENCHMARK(DetailedAnalysis)->ROW->Iterations(3);
 
 }  // namespace
