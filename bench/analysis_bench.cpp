@@ -31,7 +31,7 @@ using kelp::effect::Controls;
 using side_by_side::Compare;
 
 constexpr std::size_t kFrames = 8;
-constexpr std::size_t kRun = 120;  // frames of a whole analysis: the same, there and back
+constexpr std::size_t kRun = 60;  // frames of a whole analysis: the same, there and back
 constexpr std::size_t kLevels = 5;
 
 struct Frames final {
