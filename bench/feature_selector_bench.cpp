@@ -103,7 +103,7 @@ void RowStages(benchmark::State& state) {
     maxima.clear();
     for (std::size_t y = 0; y < h - 2 * inset; ++y) {
       const auto row = [&](std::size_t r) { return &scores[r % 3 * columns]; };
-      const float* sum = sums.NextRow();
+      const gradient_sum_row sum = sums.NextRow();
       if (kStages > 1) ScoreRow(sum, columns, params.eig_ratio_threshold, row(y));
       if (kStages > 2 && y > 1) FindMaxima(row(y - 2), row(y - 1), row(y), columns, maxima);
       benchmark::ClobberMemory();

@@ -1,5 +1,7 @@
 #include "pipeline/clip_frame_source.h"
 
+#include "tracking/color_pyramid.h"
+
 namespace calmframe::pipeline {
 
 ClipFrameSource::ClipFrameSource(media::ClipReader& reader, boost::function<void(std::size_t)> poll)
@@ -32,6 +34,11 @@ void ClipFrameSource::LoadMask(std::size_t picture, std::uint8_t* destination) {
 
 void ClipFrameSource::LoadColor(std::size_t picture, float* destination) {
   ColorFromArgb(Fetch(picture), destination);
+}
+
+void ClipFrameSource::LoadColorPyramid(std::size_t picture, marrow::tracking::ImagePyramid& pyramid,
+                                       std::vector<float>& scratch) {
+  ColorPyramidFromArgb(Fetch(picture), pyramid, scratch);
 }
 
 }  // namespace calmframe::pipeline

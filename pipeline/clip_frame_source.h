@@ -2,6 +2,7 @@
 
 #include <boost/function.hpp>
 #include <cstdint>
+#include <vector>
 
 #include "pipeline/pictures.h"
 #include "tracking/frame_preparation.h"
@@ -21,6 +22,8 @@ class ClipFrameSource final : public marrow::tracking::FrameSource {
   void LoadLuma(std::size_t picture, float* destination) override;
   void LoadMask(std::size_t picture, std::uint8_t* destination) override;
   void LoadColor(std::size_t picture, float* destination) override;
+  void LoadColorPyramid(std::size_t picture, marrow::tracking::ImagePyramid& pyramid,
+                        std::vector<float>& scratch) override;
 
  private:
   marrow::tracking::ArgbFrame Fetch(std::size_t picture);

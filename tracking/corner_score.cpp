@@ -1,7 +1,9 @@
 #include "tracking/corner_score.h"
 
 #include <algorithm>
+#include <bit>
 #include <cmath>
+#include <cstring>
 
 #undef HWY_TARGET_INCLUDE
 #define HWY_TARGET_INCLUDE "tracking/corner_score.cpp"
@@ -15,7 +17,7 @@ namespace hn = hwy::HWY_NAMESPACE;
 
 // By rounding, the radicand of a round corner can come out below 0, and a NaN would drop the corner
 // and its neighbours.
-void ScoreRowKernel(const float* HWY_RESTRICT sums, std::size_t count, float eig_ratio_threshold,
+void ScoreRowKernel(const gradient_sum_row& sums, std::size_t count, float eig_ratio_threshold,
                     float* HWY_RESTRICT scores) {
   const hn::ScalableTag<float> d;
   const std::size_t N = hn::Lanes(d);
@@ -24,8 +26,9 @@ void ScoreRowKernel(const float* HWY_RESTRICT sums, std::size_t count, float eig
   const auto ratio = hn::Set(d, eig_ratio_threshold);
   std::size_t x = 0;
   for (; x + N <= count; x += N) {
-    hn::Vec<decltype(d)> a, b, c, unused;
-    hn::LoadInterleaved4(d, sums + 4 * x, a, b, c, unused);
+    const auto a = hn::LoadU(d, sums.xx + x);
+    const auto b = hn::LoadU(d, sums.yy + x);
+    const auto c = hn::LoadU(d, sums.xy + x);
     const auto t = hn::Add(a, b);
     const auto determinant = hn::Sub(hn::Mul(a, b), hn::Mul(c, c));
     const auto radicand = hn::Sub(hn::Mul(t, t), hn::Mul(four, determinant));
@@ -35,9 +38,9 @@ void ScoreRowKernel(const float* HWY_RESTRICT sums, std::size_t count, float eig
     hn::StoreU(hn::IfThenZeroElse(elongated, score), d, scores + x);
   }
   for (; x < count; ++x) {
-    const float a = sums[4 * x];
-    const float b = sums[4 * x + 1];
-    const float c = sums[4 * x + 2];
+    const float a = sums.xx[x];
+    const float b = sums.yy[x];
+    const float c = sums.xy[x];
     const float t = a + b;
     const float root = std::sqrt(std::max(t * t - 4.0f * (a * b - c * c), 0.0f));
     const float score = t - root;
@@ -57,12 +60,13 @@ void FindMaximaKernel(const float* above, const float* row, const float* below, 
     const auto vertical = hn::Max(hn::LoadU(d, above + x), hn::LoadU(d, below + x));
     const auto sides = hn::Max(hn::Max(side(above), side(below)), side(row));
     const auto is_maximum = hn::Gt(hn::LoadU(d, row + x), hn::Max(vertical, sides));
-    if (hn::AllFalse(d, is_maximum)) continue;
-    // Maxima are rare; a lane that holds one costs a second look.
-    for (std::size_t i = x; i < x + N; ++i) {
-      const float best = std::max({above[i - 1], above[i], above[i + 1], row[i - 1], row[i + 1],
-                                   below[i - 1], below[i], below[i + 1]});
-      if (row[i] > best) columns.push_back(static_cast<std::uint32_t>(i));
+    std::uint8_t bits[8] = {};
+    hn::StoreMaskBits(d, is_maximum, bits);
+    std::uint64_t lanes = 0;
+    std::memcpy(&lanes, bits, sizeof(bits));
+    for (; lanes != 0; lanes &= lanes - 1) {
+      columns.push_back(
+          static_cast<std::uint32_t>(x + static_cast<std::size_t>(std::countr_zero(lanes))));
     }
   }
   for (; x + 1 < count; ++x) {
@@ -82,7 +86,8 @@ namespace marrow::tracking {
 HWY_EXPORT(ScoreRowKernel);
 HWY_EXPORT(FindMaximaKernel);
 
-void ScoreRow(const float* sums, std::size_t count, float eig_ratio_threshold, float* scores) {
+void ScoreRow(const gradient_sum_row& sums, std::size_t count, float eig_ratio_threshold,
+              float* scores) {
   HWY_DYNAMIC_DISPATCH(ScoreRowKernel)(sums, count, eig_ratio_threshold, scores);
 }
 

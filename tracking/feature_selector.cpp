@@ -4,6 +4,7 @@
 #include <cmath>
 #include <utility>
 
+#include "platform/memory/large_pages.h"
 #include "tracking/corner_score.h"
 
 namespace marrow::tracking {
@@ -38,9 +39,9 @@ void FeatureSelector::Configure(std::size_t width, std::size_t height) {
   height_ = height;
   // A longer distance covers the whole image from any pixel just as well.
   spacing_ = std::min<std::uint64_t>(params_.spacing, width + height);
-  luma_.assign(width * height, 0.0f);
-  mask_.assign(width * height, 0);
-  available_.resize(width * height);
+  memory::ResizeOnLargePages(luma_, width * height);
+  memory::ResizeOnLargePages(mask_, width * height);
+  memory::ResizeOnLargePages(available_, width * height);
 
   // Gradients are taken on the image inset by the border less the window and 2 pixels of margin;
   // scores where the window, and one pixel more, fits into that.

@@ -1,5 +1,7 @@
 #include "tracking/frame_preparation.h"
 
+#include <hwy/cache_control.h>
+
 #include <bit>
 #include <cstring>
 
@@ -15,6 +17,10 @@ namespace hn = hwy::HWY_NAMESPACE;
 
 // A pixel is taken as one 32-bit lane: alpha in the lowest byte, then red, green, blue.
 static_assert(std::endian::native == std::endian::little);
+
+// How far ahead of itself a conversion asks for pixels: another core has just made them, and rows
+// of small pages stop the processor's own foresight.
+constexpr std::size_t kBytesAhead = 4096;
 
 using Pixels = hn::ScalableTag<std::int32_t>;
 using Floats = hn::ScalableTag<float>;
@@ -51,6 +57,7 @@ void LumaRows(const ArgbFrame& frame, float* luma) {
     const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
     std::size_t x = 0;
     for (; x + N <= frame.width; x += N) {
+      hwy::Prefetch(row + 4 * x + kBytesAhead);
       const auto pixels = LoadPixels(row, x);
       const auto red_green = hn::Add(hn::Mul(Red(pixels), hn::Set(d, 9798)),
                                      hn::Mul(Green(pixels), hn::Set(d, 19235)));
@@ -81,12 +88,39 @@ void MaskRows(const ArgbFrame& frame, std::uint8_t* mask) {
   }
 }
 
+#if HWY_MAX_BYTES >= 32
+// Of four pixels: their twelve colours, in order, and four floats of no meaning behind them.
+template <class D>
+HWY_INLINE void StoreColorsOfFour(D df, const std::uint8_t* pixels, float* color) {
+  const hn::RebindToSigned<D> di;
+  const hn::Full128<std::uint8_t> bytes;
+  HWY_ALIGN static constexpr std::uint8_t kColors[16] = {1,  2,  3,  5,  6, 7, 9, 10,
+                                                         11, 13, 14, 15, 0, 0, 0, 0};
+  const auto colors = hn::TableLookupBytes(hn::LoadU(bytes, pixels), hn::Load(bytes, kColors));
+  if constexpr (hn::MaxLanes(D()) == 16) {
+    hn::StoreU(hn::ConvertTo(df, hn::PromoteTo(di, colors)), df, color);
+  } else {
+    const hn::Half<decltype(bytes)> half;
+    hn::StoreU(hn::ConvertTo(df, hn::PromoteTo(di, hn::LowerHalf(half, colors))), df, color);
+    hn::StoreU(hn::ConvertTo(df, hn::PromoteTo(di, hn::UpperHalf(half, colors))), df, color + 8);
+  }
+}
+#endif
+
 void ColorRows(const ArgbFrame& frame, float* color) {
   const Floats df;
   const std::size_t N = hn::Lanes(df);
   for (std::size_t y = 0; y < frame.height; ++y, color += 3 * frame.width) {
     const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
     std::size_t x = 0;
+#if HWY_MAX_BYTES >= 32
+    // What is stored too much is the next pixels' place; the last ones are left to the loops below.
+    const hn::CappedTag<float, 16> capped;
+    for (; x + 6 <= frame.width; x += 4) {
+      hwy::Prefetch(row + 4 * x + kBytesAhead);
+      StoreColorsOfFour(capped, row + 4 * x, color + 3 * x);
+    }
+#endif
     for (; x + N <= frame.width; x += N) {
       const auto pixels = LoadPixels(row, x);
       hn::StoreInterleaved3(hn::ConvertTo(df, Red(pixels)), hn::ConvertTo(df, Green(pixels)),

@@ -15,25 +15,27 @@ namespace marrow::tracking {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
-// out[x] = taps[0] centre[x] + sum over k of taps[k] (before(k)[x] + after(k)[x]). Inputs are
-// readable and `out` is writable for one block of vectors past count. Not fused into multiply-adds:
-// targets without them would round differently.
-template <class Before, class After>
-HWY_INLINE void Convolve(const float* taps, std::size_t radius, const float* centre,
-                         const Before& before, const After& after, std::size_t count, float* out) {
+// Both passes form taps[0] centre + sum over k of taps[k] (before(k) + after(k)), k ascending. Not
+// fused into multiply-adds: targets without them would round differently.
+
+// before(k) and after(k) are k pixels to the left and to the right. `padded` is readable and `out`
+// writable for one block of vectors past count.
+void SmoothAlongX(const float* taps, std::size_t radius, const float* padded, std::size_t count,
+                  float* out) {
   const hn::ScalableTag<float> d;
   const std::size_t N = hn::Lanes(d);
   // Four vectors at a time hide the latency of the chain of additions.
   for (std::size_t x = 0; x < count; x += 4 * N) {
+    const float* centre = padded + radius + x;
     const auto middle = hn::Set(d, taps[0]);
-    auto s0 = hn::Mul(middle, hn::LoadU(d, centre + x));
-    auto s1 = hn::Mul(middle, hn::LoadU(d, centre + x + N));
-    auto s2 = hn::Mul(middle, hn::LoadU(d, centre + x + 2 * N));
-    auto s3 = hn::Mul(middle, hn::LoadU(d, centre + x + 3 * N));
+    auto s0 = hn::Mul(middle, hn::LoadU(d, centre));
+    auto s1 = hn::Mul(middle, hn::LoadU(d, centre + N));
+    auto s2 = hn::Mul(middle, hn::LoadU(d, centre + 2 * N));
+    auto s3 = hn::Mul(middle, hn::LoadU(d, centre + 3 * N));
     for (std::size_t k = 1; k <= radius; ++k) {
       const auto tap = hn::Set(d, taps[k]);
-      const float* b = before(k) + x;
-      const float* a = after(k) + x;
+      const float* b = centre - k;
+      const float* a = centre + k;
       s0 = hn::Add(s0, hn::Mul(tap, hn::Add(hn::LoadU(d, b), hn::LoadU(d, a))));
       s1 = hn::Add(s1, hn::Mul(tap, hn::Add(hn::LoadU(d, b + N), hn::LoadU(d, a + N))));
       s2 = hn::Add(s2, hn::Mul(tap, hn::Add(hn::LoadU(d, b + 2 * N), hn::LoadU(d, a + 2 * N))));
@@ -46,20 +48,54 @@ HWY_INLINE void Convolve(const float* taps, std::size_t radius, const float* cen
   }
 }
 
-void SmoothAlongX(const float* taps, std::size_t radius, const float* padded, std::size_t count,
-                  float* out) {
-  const float* centre = padded + radius;
-  Convolve(
-      taps, radius, centre, [centre](std::size_t k) { return centre - k; },
-      [centre](std::size_t k) { return centre + k; }, count, out);
+constexpr std::size_t kRowsAtOnce = SeparableSmoother::kRowsAtOnce;
+
+// A vector of each of kRows rows one under the other: from tap to tap each of them takes over what
+// its neighbour had, so that two loads serve them all.
+template <std::size_t kRows, class D>
+HWY_INLINE void SmoothRowsAt(D d, const float* taps, std::size_t radius, const float* const* rows,
+                             std::size_t x, float* out, std::size_t stride) {
+  const auto row = [=](std::size_t j) HWY_ATTR { return hn::LoadU(d, rows[j] + x); };
+  hn::Vec<D> before[kRows], after[kRows], sum[kRows];
+  for (std::size_t j = 0; j < kRows; ++j) {
+    before[j] = after[j] = row(radius + j);
+    sum[j] = hn::Mul(hn::Set(d, taps[0]), before[j]);
+  }
+  for (std::size_t k = 1; k <= radius; ++k) {
+    const auto tap = hn::Set(d, taps[k]);
+    for (std::size_t j = kRows - 1; j > 0; --j) before[j] = before[j - 1];
+    for (std::size_t j = 0; j + 1 < kRows; ++j) after[j] = after[j + 1];
+    before[0] = row(radius - k);
+    after[kRows - 1] = row(radius + k + kRows - 1);
+    for (std::size_t j = 0; j < kRows; ++j) {
+      sum[j] = hn::Add(sum[j], hn::Mul(tap, hn::Add(before[j], after[j])));
+    }
+  }
+  for (std::size_t j = 0; j < kRows; ++j) hn::StoreU(sum[j], d, out + j * stride + x);
 }
 
-// rows[radius] is the centre.
+template <std::size_t kRows>
+HWY_INLINE void SmoothRows(const float* taps, std::size_t radius, const float* const* rows,
+                           std::size_t count, float* out, std::size_t stride) {
+  const hn::ScalableTag<float> d;
+  const std::size_t N = hn::Lanes(d);
+  std::size_t x = 0;
+  for (; x + N <= count; x += N) SmoothRowsAt<kRows>(d, taps, radius, rows, x, out, stride);
+  for (; x < count; ++x) {
+    SmoothRowsAt<kRows>(hn::CappedTag<float, 1>(), taps, radius, rows, x, out, stride);
+  }
+}
+
+// rows[radius] lies at out's first row. `out_rows` is kRowsAtOnce or less.
 void SmoothAlongY(const float* taps, std::size_t radius, const float* const* rows,
-                  std::size_t count, float* out) {
-  Convolve(
-      taps, radius, rows[radius], [=](std::size_t k) { return rows[radius - k]; },
-      [=](std::size_t k) { return rows[radius + k]; }, count, out);
+                  std::size_t count, std::size_t out_rows, float* out, std::size_t stride) {
+  if (out_rows == kRowsAtOnce) {
+    SmoothRows<kRowsAtOnce>(taps, radius, rows, count, out, stride);
+    return;
+  }
+  for (std::size_t j = 0; j < out_rows; ++j) {
+    SmoothRows<1>(taps, radius, rows + j, count, out + j * stride, stride);
+  }
 }
 
 std::size_t BlockOfVectors() {
@@ -104,38 +140,39 @@ SeparableSmoother::SeparableSmoother(std::vector<float> kernel, std::size_t max_
     : taps_(kernel.begin() + static_cast<std::ptrdiff_t>(kernel.size() / 2), kernel.end()) {
   const std::size_t block = HWY_DYNAMIC_DISPATCH(BlockOfVectors)();
   ring_stride_ = (max_width + block - 1) / block * block;
+  rows_.resize(kernel.size() + kRowsAtOnce - 1);
   padded_.resize(ring_stride_ + kernel.size());
-  ring_.resize(ring_stride_ * (kernel.size() + 1));
-  rows_.resize(kernel.size());
+  ring_.resize(ring_stride_ * rows_.size());
 }
 
 void SeparableSmoother::Smooth(float* image, std::size_t stride, const PixelRegion& region) {
   if (region.empty()) return;
   const std::size_t radius = taps_.size() - 1;
-  const std::size_t ring_rows = 2 * radius + 1;
   const std::size_t count = region.x1 - region.x0;
   const std::size_t height = region.y1 - region.y0;
-  float* out = ring_.data() + ring_rows * ring_stride_;
+  const auto row_of = [&](std::size_t y) { return image + (region.y0 + y) * stride + region.x0; };
+  const auto ring_row = [&](std::size_t y) {
+    return ring_.data() + y % rows_.size() * ring_stride_;
+  };
 
   // Row y may be overwritten as soon as rows up to y + radius are in the ring.
   std::size_t in_ring = 0;
-  for (std::size_t y = 0; y < height; ++y) {
-    for (; in_ring < std::min(height, y + radius + 1); ++in_ring) {
-      const float* row = image + (region.y0 + in_ring) * stride + region.x0;
+  for (std::size_t y = 0; y < height; y += kRowsAtOnce) {
+    const std::size_t out_rows = std::min(kRowsAtOnce, height - y);
+    for (; in_ring < std::min(height, y + out_rows + radius); ++in_ring) {
+      const float* row = row_of(in_ring);
       std::fill_n(padded_.begin(), radius, row[0]);
       std::copy_n(row, count, padded_.data() + radius);
       std::fill_n(padded_.data() + radius + count, radius, row[count - 1]);
       HWY_DYNAMIC_DISPATCH(SmoothAlongX)
-      (taps_.data(), radius, padded_.data(), count,
-       ring_.data() + in_ring % ring_rows * ring_stride_);
+      (taps_.data(), radius, padded_.data(), count, ring_row(in_ring));
     }
-    for (std::size_t k = 0; k < ring_rows; ++k) {
-      const std::size_t below = std::min(y + k, height - 1 + radius);
-      const std::size_t row = below < radius ? 0 : below - radius;
-      rows_[k] = ring_.data() + row % ring_rows * ring_stride_;
+    for (std::size_t j = 0; j < out_rows + 2 * radius; ++j) {
+      const std::size_t below = std::min(y + j, height - 1 + radius);
+      rows_[j] = ring_row(below < radius ? 0 : below - radius);
     }
-    HWY_DYNAMIC_DISPATCH(SmoothAlongY)(taps_.data(), radius, rows_.data(), count, out);
-    std::copy_n(out, count, image + (region.y0 + y) * stride + region.x0);
+    HWY_DYNAMIC_DISPATCH(SmoothAlongY)
+    (taps_.data(), radius, rows_.data(), count, out_rows, row_of(y), stride);
   }
 }
 

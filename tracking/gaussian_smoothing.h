@@ -20,6 +20,9 @@ std::vector<float> IntegratedGaussian(double sigma);
 // constant.
 class SeparableSmoother {
  public:
+  // Rows that the pass along y makes together: so many share what they read.
+  static constexpr std::size_t kRowsAtOnce = 4;
+
   // An odd number of taps, symmetric about the middle one; lines of at most max_width pixels.
   SeparableSmoother(std::vector<float> kernel, std::size_t max_width);
 
@@ -28,11 +31,11 @@ class SeparableSmoother {
   void Smooth(float* image, std::size_t stride, const PixelRegion& region);
 
  private:
-  std::vector<float> taps_;    // middle tap first
-  std::size_t ring_stride_;    // width rounded up to whole vectors
-  std::vector<float> padded_;  // one row with its edges repeated
-  std::vector<float> ring_;    // the 2 r + 1 rows about the current one, smoothed along x
-  std::vector<const float*> rows_;
+  std::vector<float> taps_;         // middle tap first
+  std::size_t ring_stride_;         // width rounded up to whole vectors
+  std::vector<float> padded_;       // one row with its edges repeated
+  std::vector<float> ring_;         // the rows that are at hand, smoothed along x
+  std::vector<const float*> rows_;  // in the ring: those that a few neighbouring rows depend on
 };
 
 }  // namespace marrow::tracking

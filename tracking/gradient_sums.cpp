@@ -12,90 +12,127 @@ namespace marrow::tracking {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
-// Products of `count` pixels of `row`, interleaved with a fourth 0. Reads one pixel to each side.
-void GradientProducts(const float* row, std::size_t stride, std::size_t count,
-                      float* HWY_RESTRICT products) {
-  const hn::ScalableTag<float> d;
-  const std::size_t N = hn::Lanes(d);
-  const float* above = row - stride;
-  const float* below = row + stride;
-  std::size_t x = 0;
-  for (; x + N <= count; x += N) {
-    const auto ix = hn::Sub(hn::LoadU(d, row + x + 1), hn::LoadU(d, row + x - 1));
-    const auto iy = hn::Sub(hn::LoadU(d, below + x), hn::LoadU(d, above + x));
-    hn::StoreInterleaved4(hn::Mul(ix, ix), hn::Mul(iy, iy), hn::Mul(ix, iy), hn::Zero(d), d,
-                          products + 4 * x);
-  }
-  for (; x < count; ++x) {
-    const float ix = row[x + 1] - row[x - 1];
-    const float iy = below[x] - above[x];
-    products[4 * x] = ix * ix;
-    products[4 * x + 1] = iy * iy;
-    products[4 * x + 2] = ix * iy;
-    products[4 * x + 3] = 0.0f;
+// Lanes of the sums. The products' vectors have as many floats.
+using Sums = hn::CappedTag<double, 8>;
+
+template <class D>
+struct Products {
+  hn::Vec<D> xx, yy, xy;
+};
+
+// Of the pixels at `row`: reads one pixel more to each side.
+template <class D>
+HWY_INLINE Products<D> ProductsAt(D d, const float* row, std::size_t stride) {
+  const auto ix = hn::Sub(hn::LoadU(d, row + 1), hn::LoadU(d, row - 1));
+  const auto iy = hn::Sub(hn::LoadU(d, row + stride), hn::LoadU(d, row - stride));
+  return {hn::Mul(ix, ix), hn::Mul(iy, iy), hn::Mul(ix, iy)};
+}
+
+// Adds an image row's products to the sums of their columns and, with kMove, takes another's away.
+template <bool kMove, class D>
+HWY_INLINE void UpdateColumns(D d, const float* entering, const float* leaving, std::size_t stride,
+                              std::size_t plane, double* column) {
+  const hn::Rebind<float, D> df;
+  const auto in = ProductsAt(df, entering, stride);
+  if constexpr (kMove) {
+    const auto out = ProductsAt(df, leaving, stride);
+    const auto move = [&](auto from, auto to, double* sum) HWY_ATTR {
+      const auto change = hn::Sub(hn::PromoteTo(d, from), hn::PromoteTo(d, to));
+      hn::StoreU(hn::Add(hn::LoadU(d, sum), change), d, sum);
+    };
+    move(in.xx, out.xx, column);
+    move(in.yy, out.yy, column + plane);
+    move(in.xy, out.xy, column + 2 * plane);
+  } else {
+    const auto add = [&](auto from, double* sum) HWY_ATTR {
+      hn::StoreU(hn::Add(hn::LoadU(d, sum), hn::PromoteTo(d, from)), d, sum);
+    };
+    add(in.xx, column);
+    add(in.yy, column + plane);
+    add(in.xy, column + 2 * plane);
   }
 }
 
-void AddToColumns(const float* HWY_RESTRICT entering, std::size_t columns,
-                  double* HWY_RESTRICT column_sums) {
-  const hn::CappedTag<double, 4> d;
-  const hn::Rebind<float, decltype(d)> df;
-  const std::size_t N = hn::Lanes(d);
-  for (std::size_t i = 0; i < 4 * columns; i += N) {
-    const auto sum =
-        hn::Add(hn::LoadU(d, column_sums + i), hn::PromoteTo(d, hn::LoadU(df, entering + i)));
-    hn::StoreU(sum, d, column_sums + i);
-  }
+// v with lane j moved to lane j + kShift, and 0 in the first ones.
+template <std::size_t kShift, class D, class V>
+HWY_INLINE V MoveUp(D d, V v) {
+  const hn::RebindToSigned<D> di;
+  const auto lane = hn::Iota(di, 0);
+  const auto shift = hn::Set(di, static_cast<std::int64_t>(kShift));
+  const auto from = hn::Max(hn::Sub(lane, shift), hn::Zero(di));
+  const auto moved = hn::TableLookupLanes(v, hn::IndicesFromVec(d, from));
+  return hn::IfThenElseZero(hn::RebindMask(d, hn::Gt(hn::Iota(di, 1), shift)), moved);
 }
 
-// Runs along a row with the sum over `window` columns; with kMove, each column's sum is first moved
-// down by one image row. A pixel's sums stand together in one vector (or two, or four), so that one
-// serial chain of additions carries them all.
+template <class D, class V>
+HWY_INLINE V LastLane(D d, V v) {
+  const hn::RebindToSigned<D> di;
+  const auto last = hn::Set(di, static_cast<std::int64_t>(hn::Lanes(d)) - 1);
+  return hn::TableLookupLanes(v, hn::IndicesFromVec(d, last));
+}
+
+// Runs along a row with the sum over the window's columns, a vector of places at a time: their
+// differences from the place before are added up within the vector, then to the sum so far. With
+// kMove the columns' sums are first moved down by one image row.
 template <bool kMove>
-HWY_INLINE void SumRow(const float* HWY_RESTRICT entering, const float* HWY_RESTRICT leaving,
-                       std::size_t columns, std::size_t window, double* HWY_RESTRICT column_sums,
-                       float* HWY_RESTRICT sums) {
-  const hn::CappedTag<double, 4> d;
-  const hn::Rebind<float, decltype(d)> df;
-  constexpr std::size_t N = hn::MaxLanes(decltype(d)());
-  constexpr std::size_t kParts = 4 / N;
-  hn::Vec<decltype(d)> running[kParts];
-  for (std::size_t p = 0; p < kParts; ++p) running[p] = hn::Zero(d);
-
-  const auto column = [&](std::size_t i) HWY_ATTR {
-    auto sum = hn::LoadU(d, column_sums + i);
-    if constexpr (kMove) {
-      sum = hn::Add(sum, hn::Sub(hn::PromoteTo(d, hn::LoadU(df, entering + i)),
-                                 hn::PromoteTo(d, hn::LoadU(df, leaving + i))));
-      hn::StoreU(sum, d, column_sums + i);
+HWY_INLINE void SumRow(const gradient_sum_planes& planes, const float* entering,
+                       const float* leaving, std::size_t stride, double* column_sums, float* sums) {
+  const Sums d;
+  const hn::Rebind<float, Sums> df;
+  constexpr std::size_t N = hn::MaxLanes(Sums());
+  double* columns = column_sums + planes.window;
+  hn::Vec<Sums> running[3] = {hn::Zero(d), hn::Zero(d), hn::Zero(d)};
+  const auto sum_window = [&](std::size_t x) HWY_ATTR {
+    for (std::size_t p = 0; p < 3; ++p) {
+      const double* column = columns + p * planes.column_stride + x;
+      auto change = hn::Sub(hn::LoadU(d, column), hn::LoadU(d, column - planes.window));
+      if constexpr (N > 1) change = hn::Add(change, MoveUp<1>(d, change));
+      if constexpr (N > 2) change = hn::Add(change, MoveUp<2>(d, change));
+      if constexpr (N > 4) change = hn::Add(change, MoveUp<4>(d, change));
+      const auto sum = hn::Add(running[p], change);
+      hn::StoreU(hn::DemoteTo(df, sum), df, sums + p * planes.sum_stride + x);
+      running[p] = LastLane(d, sum);
     }
-    return sum;
   };
-  for (std::size_t x = 0; x < window; ++x) {
-    for (std::size_t p = 0; p < kParts; ++p) {
-      running[p] = hn::Add(running[p], column(4 * x + p * N));
+  std::size_t x = 0;
+  for (; x + N <= planes.columns; x += N) {
+    if constexpr (kMove) {
+      UpdateColumns<true>(d, entering + x, leaving + x, stride, planes.column_stride, columns + x);
+    }
+    sum_window(x);
+  }
+  if (x == planes.columns) return;
+  if constexpr (kMove) {
+    for (std::size_t i = x; i < planes.columns; ++i) {
+      UpdateColumns<true>(hn::CappedTag<double, 1>(), entering + i, leaving + i, stride,
+                          planes.column_stride, columns + i);
     }
   }
-  for (std::size_t p = 0; p < kParts; ++p) {
-    hn::StoreU(hn::DemoteTo(df, running[p]), df, sums + p * N);
+  sum_window(x);
+}
+
+void AddToColumns(const gradient_sum_planes& planes, const float* entering, std::size_t stride,
+                  double* column_sums) {
+  const Sums d;
+  const std::size_t N = hn::Lanes(d);
+  double* columns = column_sums + planes.window;
+  std::size_t x = 0;
+  for (; x + N <= planes.columns; x += N) {
+    UpdateColumns<false>(d, entering + x, nullptr, stride, planes.column_stride, columns + x);
   }
-  for (std::size_t x = window; x < columns; ++x) {
-    for (std::size_t p = 0; p < kParts; ++p) {
-      const std::size_t i = 4 * x + p * N;
-      const auto change = hn::Sub(column(i), hn::LoadU(d, column_sums + i - 4 * window));
-      running[p] = hn::Add(running[p], change);
-      hn::StoreU(hn::DemoteTo(df, running[p]), df, sums + i - 4 * (window - 1));
-    }
+  for (; x < planes.columns; ++x) {
+    UpdateColumns<false>(hn::CappedTag<double, 1>(), entering + x, nullptr, stride,
+                         planes.column_stride, columns + x);
   }
 }
 
-void SumFirstRow(std::size_t columns, std::size_t window, double* column_sums, float* sums) {
-  SumRow<false>(nullptr, nullptr, columns, window, column_sums, sums);
+void SumFirstRow(const gradient_sum_planes& planes, double* column_sums, float* sums) {
+  SumRow<false>(planes, nullptr, nullptr, 0, column_sums, sums);
 }
 
-void SumNextRow(const float* entering, const float* leaving, std::size_t columns,
-                std::size_t window, double* column_sums, float* sums) {
-  SumRow<true>(entering, leaving, columns, window, column_sums, sums);
+void SumNextRow(const gradient_sum_planes& planes, const float* entering, const float* leaving,
+                std::size_t stride, double* column_sums, float* sums) {
+  SumRow<true>(planes, entering, leaving, stride, column_sums, sums);
 }
 
 }  // namespace HWY_NAMESPACE
@@ -106,53 +143,47 @@ HWY_AFTER_NAMESPACE();
 namespace marrow::tracking {
 namespace {
 
-HWY_EXPORT(GradientProducts);
 HWY_EXPORT(AddToColumns);
 HWY_EXPORT(SumFirstRow);
 HWY_EXPORT(SumNextRow);
+
+constexpr std::size_t kMostLanes = 8;
 
 }  // namespace
 
 GradientSums::GradientSums(std::size_t half_win_x, std::size_t half_win_y, std::size_t max_width)
     : half_win_x_(half_win_x),
       half_win_y_(half_win_y),
-      entering_(4 * max_width),
-      leaving_(4 * max_width),
-      sums_(4 * max_width),
-      column_sums_(4 * max_width) {}
+      planes_{0, 2 * half_win_x + 1, 2 * half_win_x + 1 + max_width + kMostLanes,
+              max_width + kMostLanes},
+      column_sums_(3 * planes_.column_stride),
+      sums_(3 * planes_.sum_stride) {}
 
 void GradientSums::Start(const float* image, std::size_t stride, const PixelRegion& region) {
-  image_ = image;
   stride_ = stride;
-  first_column_ = region.x0 - half_win_x_;
-  columns_ = region.x1 - region.x0 + 2 * half_win_x_;
-  y_ = region.y0;
+  planes_.columns = region.x1 - region.x0 + 2 * half_win_x_;
+  window_top_ = image + (region.y0 - half_win_y_) * stride + region.x0 - half_win_x_;
   started_ = false;
   std::fill(column_sums_.begin(), column_sums_.end(), 0.0);
 }
 
-void GradientSums::FormProducts(std::size_t y, float* products) const {
-  HWY_DYNAMIC_DISPATCH(GradientProducts)
-  (image_ + y * stride_ + first_column_, stride_, columns_, products);
-}
-
-const float* GradientSums::NextRow() {
-  const std::size_t window = 2 * half_win_x_ + 1;
+gradient_sum_row GradientSums::NextRow() {
+  const std::size_t window_rows = 2 * half_win_y_ + 1;
   if (!started_) {
-    for (std::size_t y = y_ - half_win_y_; y <= y_ + half_win_y_; ++y) {
-      FormProducts(y, entering_.data());
-      HWY_DYNAMIC_DISPATCH(AddToColumns)(entering_.data(), columns_, column_sums_.data());
+    for (std::size_t v = 0; v < window_rows; ++v) {
+      HWY_DYNAMIC_DISPATCH(AddToColumns)
+      (planes_, window_top_ + v * stride_, stride_, column_sums_.data());
     }
-    HWY_DYNAMIC_DISPATCH(SumFirstRow)(columns_, window, column_sums_.data(), sums_.data());
+    HWY_DYNAMIC_DISPATCH(SumFirstRow)(planes_, column_sums_.data(), sums_.data());
     started_ = true;
   } else {
-    FormProducts(y_ + half_win_y_, entering_.data());
-    FormProducts(y_ - half_win_y_ - 1, leaving_.data());
     HWY_DYNAMIC_DISPATCH(SumNextRow)
-    (entering_.data(), leaving_.data(), columns_, window, column_sums_.data(), sums_.data());
+    (planes_, window_top_ + window_rows * stride_, window_top_, stride_, column_sums_.data(),
+     sums_.data());
+    window_top_ += stride_;
   }
-  ++y_;
-  return sums_.data();
+  const float* first = sums_.data() + 2 * half_win_x_;
+  return {first, first + planes_.sum_stride, first + 2 * planes_.sum_stride};
 }
 
 }  // namespace marrow::tracking

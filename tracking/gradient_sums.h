@@ -7,6 +7,22 @@
 
 namespace marrow::tracking {
 
+// A row of gradient matrices: for each pixel the window's sums of Ix Ix, Iy Iy and Ix Iy.
+struct gradient_sum_row {
+  const float* xx;
+  const float* yy;
+  const float* xy;
+};
+
+// How GradientSums' three planes lie, plane p beginning p strides behind the first. Before the
+// columns stand `window` zeroes; behind them there is room for a vector of any target.
+struct gradient_sum_planes {
+  std::size_t columns;        // the region's and half a window on each side
+  std::size_t window;         // columns of a window
+  std::size_t column_stride;  // of the sums over columns
+  std::size_t sum_stride;     // of the sums over windows
+};
+
 // The gradient matrix of each pixel's window, row by row from the top: sums over (2 half_win_x + 1)
 // by (2 half_win_y + 1) pixels of Ix Ix, Iy Iy and Ix Iy, where Ix = I(x + 1, y) - I(x - 1, y) and
 // Iy likewise, not halved. Running sums in 64-bit floats: the cost does not depend on the window,
@@ -21,24 +37,18 @@ class GradientSums {
   // must stay unchanged until the last row is read.
   void Start(const float* image, std::size_t stride, const PixelRegion& region);
 
-  // Sums of the region's next row: for each of its columns sum Ix Ix, sum Iy Iy, sum Ix Iy, 0.
-  // Valid until the next call.
-  const float* NextRow();
+  // Sums of the region's next row, valid until the next call.
+  gradient_sum_row NextRow();
 
  private:
-  void FormProducts(std::size_t y, float* products) const;
-
   std::size_t half_win_x_;
   std::size_t half_win_y_;
-  const float* image_ = nullptr;
+  gradient_sum_planes planes_;
+  const float* window_top_ = nullptr;  // first pixel of the first window of the row read last
   std::size_t stride_ = 0;
-  std::size_t first_column_ = 0;  // of the products
-  std::size_t columns_ = 0;       // of the products: the region's and half a window on each side
-  std::size_t y_ = 0;             // row of the next sums
   bool started_ = false;
-  // Four numbers a column, the fourth 0.
-  std::vector<float> entering_, leaving_, sums_;
-  std::vector<double> column_sums_;
+  std::vector<double> column_sums_;  // over the rows of a window
+  std::vector<float> sums_;          // of windows that end at a column
 };
 
 }  // namespace marrow::tracking

@@ -43,4 +43,9 @@ void BuildLevels(ImagePyramid& pyramid, std::vector<float>& scratch);
 void ReduceLevel(const float* source, std::size_t width, std::size_t height, std::size_t channels,
                  float* destination, std::vector<float>& scratch);
 
+// One of the destination's rows but the first and the last, from the source's row over it, which
+// has `width` pixels, at least 3. scratch has as many samples.
+void ReduceRow(const float* source, std::size_t width, std::size_t channels, float* destination,
+               float* scratch);
+
 }  // namespace marrow::tracking

@@ -50,10 +50,6 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
     tracking_feature<float>* row = all_features.features->data() + t * feature_count;
     TrackingStatistics frame{0, std::vector<std::size_t>(levels + 1),
                              std::vector<std::size_t>(levels + 1)};
-    const auto load_color = [&] {
-      source.LoadColor(t, current.LevelData(0));
-      BuildLevels(current, scratch);
-    };
     const auto load_candidates = [&] {
       source.LoadLuma(t, selector.luma());
       source.LoadMask(t, selector.mask());
@@ -65,7 +61,7 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
       load_candidates();
       selector.SelectFirst();
     } else {
-      load_color();
+      source.LoadColorPyramid(t, current, scratch);
       tracker.TrackFeatures(previous, current, row - feature_count, row, feature_count, frame);
       tracker.VerifyFeatures(current, row, frame);
       load_candidates();
@@ -75,7 +71,7 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
     }
     frame.new_features =
         FillSlots(selector.selected, static_cast<std::int32_t>(t) + 1, feature_count, row);
-    if (t == 0) load_color();
+    if (t == 0) source.LoadColorPyramid(t, current, scratch);
     tracker.InitialiseSeeds(current, row);
     std::swap(previous, current);
     if (statistics != nullptr) statistics->push_back(std::move(frame));

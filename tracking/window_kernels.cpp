@@ -151,6 +151,11 @@ void SplitGradients(const float* block, const window_shape& shape, float* t, flo
     for (; i + N <= length; i += N) {
       SplitVector(d, centre + i, C, stride, t + o + i, gx + o + i, gy + o + i);
     }
+    if (i < length && length >= N) {  // the last vector overlaps the one before
+      i = length - N;
+      SplitVector(d, centre + i, C, stride, t + o + i, gx + o + i, gy + o + i);
+      continue;
+    }
     for (; i < length; ++i) {
       SplitVector(hn::CappedTag<float, 1>(), centre + i, C, stride, t + o + i, gx + o + i,
                   gy + o + i);
@@ -172,6 +177,26 @@ HWY_INLINE void SamplePixel(const float* in, std::size_t stride, float fx, float
   }
 }
 
+// Where N neighbouring pixels of a row come from: the four samples about each start at offset[j].
+struct PixelPlaces {
+  HWY_ALIGN std::int32_t offset[17];
+  HWY_ALIGN float fx[16];
+  HWY_ALIGN float fy[16];
+  std::uint32_t jumps = 0;  // bit j: pixel j + 1 is not read right beside pixel j
+};
+
+template <std::size_t C, bool kWide>
+HWY_INLINE void SamplePixels(const float* origin, std::size_t stride, const PixelPlaces& places,
+                             std::size_t first, std::size_t end, float* out) {
+  for (std::size_t j = first; j < end; ++j) {
+    SamplePixel<C, kWide>(origin + places.offset[j], stride, places.fx[j], places.fy[j],
+                          out + j * C);
+  }
+}
+
+// A warp is near the identity: most neighbours are read side by side, so that a vector of samples
+// comes in one piece, and each lane differs from a shift only by its pixel's fractions. kWide
+// allows to read a vector past a pixel's four, and to write as much past all rows but the last.
 template <std::size_t C, bool kWide>
 HWY_INLINE void SampleAffineRows(const float* image, std::size_t image_width,
                                  const affine_sampling& warp, const window_shape& shape,
@@ -186,30 +211,57 @@ HWY_INLINE void SampleAffineRows(const float* image, std::size_t image_width,
   const auto m10 = hn::Set(d, warp.m10);
   const float* origin = image + warp.y * static_cast<std::ptrdiff_t>(stride) +
                         warp.x * static_cast<std::ptrdiff_t>(C);
-  HWY_ALIGN std::int32_t offset[16];
-  HWY_ALIGN float fx[16];
-  HWY_ALIGN float fy[16];
+  // Pixel of each sample of C vectors.
+  HWY_ALIGN std::int32_t pixel_of[16 * C];
+  for (std::size_t i = 0; i < C * N; ++i) pixel_of[i] = static_cast<std::int32_t>(i / C);
+  PixelPlaces places;
+  places.offset[N] = 0;
   const auto half_x = static_cast<float>(shape.half_x);
   for (std::size_t row = 0; row < shape.rows(); ++row) {
     const float v = static_cast<float>(row) - static_cast<float>(shape.half_y);
     const auto row_x = hn::MulAdd(hn::Set(d, warp.m01), hn::Set(d, v), hn::Set(d, warp.fx));
     const auto row_y = hn::MulAdd(hn::Set(d, warp.m11), hn::Set(d, v), hn::Set(d, warp.fy));
+    const bool last_row = row + 1 == shape.rows();
     for (std::size_t column = 0; column < shape.columns(); column += N) {
       const auto u = hn::Iota(d, static_cast<float>(column) - half_x);
       const auto x = hn::MulAdd(m00, u, row_x);
       const auto y = hn::MulAdd(m10, u, row_y);
       const auto x_floor = hn::Floor(x);
       const auto y_floor = hn::Floor(y);
-      hn::Store(hn::Sub(x, x_floor), d, fx);
-      hn::Store(hn::Sub(y, y_floor), d, fy);
-      hn::Store(hn::Add(hn::Mul(hn::ConvertTo(di, x_floor), pixel_step),
-                        hn::Mul(hn::ConvertTo(di, y_floor), row_step)),
-                di, offset);
+      const auto fx = hn::Sub(x, x_floor);
+      const auto fy = hn::Sub(y, y_floor);
+      const auto offset = hn::Add(hn::Mul(hn::ConvertTo(di, x_floor), pixel_step),
+                                  hn::Mul(hn::ConvertTo(di, y_floor), row_step));
+      hn::Store(fx, d, places.fx);
+      hn::Store(fy, d, places.fy);
+      hn::Store(offset, di, places.offset);
       const std::size_t count = std::min(N, shape.columns() - column);
-      for (std::size_t j = 0; j < count; ++j) {
-        SamplePixel<C, kWide>(origin + offset[j], stride, fx[j], fy[j], out);
-        out += C;
+      if constexpr (!kWide) {
+        SamplePixels<C, kWide>(origin, stride, places, 0, count, out);
+      } else {
+        const auto jump = hn::Ne(hn::Sub(hn::LoadU(di, places.offset + 1), offset), pixel_step);
+        std::uint8_t bits[8] = {};
+        hn::StoreMaskBits(di, jump, bits);
+        places.jumps = bits[0] | static_cast<std::uint32_t>(bits[1]) << 8;
+        for (std::size_t k = 0; k * N < count * C; ++k) {
+          const std::size_t first = k * N / C;
+          const std::size_t end = std::min(((k + 1) * N - 1) / C + 1, count);
+          const std::uint32_t inside = (1u << (end - 1)) - (1u << first);
+          const bool whole = (k + 1) * N <= count * C || !last_row;
+          if ((places.jumps & inside) != 0 || !whole) {
+            SamplePixels<C, kWide>(origin, stride, places, first, end, out);
+            continue;
+          }
+          const float* in = origin + places.offset[first] + (k * N - first * C);
+          const auto pixel = hn::SetTableIndices(d, pixel_of + k * N);
+          const auto wx = hn::TableLookupLanes(fx, pixel);
+          const auto wy = hn::TableLookupLanes(fy, pixel);
+          const auto above = Lerp(hn::LoadU(d, in), hn::LoadU(d, in + C), wx);
+          const auto below = Lerp(hn::LoadU(d, in + stride), hn::LoadU(d, in + stride + C), wx);
+          hn::StoreU(Lerp(above, below, wy), d, out + k * N);
+        }
       }
+      out += count * C;
     }
   }
   *out = 0.0f;
@@ -240,12 +292,12 @@ bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
 
 void SampleAffine(const float* image, std::size_t image_width, std::size_t image_height,
                   const affine_sampling& warp, const window_shape& shape, float* out) {
-  // Wide reads of three channels touch the sample behind a pixel's right neighbour, which on the
-  // image's last row may lie behind the image.
+  // Wide reads go on behind a pixel's right neighbour, which on the image's last row may lie behind
+  // the image.
   const float reach = std::max(warp.m10, -warp.m10) * static_cast<float>(shape.half_x) +
                       std::max(warp.m11, -warp.m11) * static_cast<float>(shape.half_y) + 3.0f;
   const bool clear_of_last_row =
-      HWY_TARGET != HWY_SCALAR &&
+      HWY_TARGET != HWY_SCALAR && image_width >= 16 &&
       static_cast<float>(warp.y) + reach < static_cast<float>(image_height) - 1.0f;
   WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
     constexpr std::size_t C = decltype(channels)::value;

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "tracking/color_pyramid.h"
+
 namespace kelp::analysis {
 namespace {
 
@@ -96,6 +98,11 @@ void JobFrameSource::LoadMask(std::size_t frame, std::uint8_t* destination) {
 
 void JobFrameSource::LoadColor(std::size_t frame, float* destination) {
   Load(color_, frame, [&](const auto& argb) { ColorFromArgb(argb, destination); });
+}
+
+void JobFrameSource::LoadColorPyramid(std::size_t frame, marrow::tracking::ImagePyramid& pyramid,
+                                      std::vector<float>& scratch) {
+  Load(color_, frame, [&](const auto& argb) { ColorPyramidFromArgb(argb, pyramid, scratch); });
 }
 
 }  // namespace kelp::analysis

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <vector>
 
 #include "analysis/src/job.h"
 #include "tracking/frame_preparation.h"
@@ -33,6 +34,8 @@ class JobFrameSource final : public marrow::tracking::FrameSource {
   void LoadLuma(std::size_t frame, float* destination) override;
   void LoadMask(std::size_t frame, std::uint8_t* destination) override;
   void LoadColor(std::size_t frame, float* destination) override;
+  void LoadColorPyramid(std::size_t frame, marrow::tracking::ImagePyramid& pyramid,
+                        std::vector<float>& scratch) override;
 
   // Releases the frames that are still held: colour, luma, mask.
   void ReleaseFrames();

@@ -26,8 +26,8 @@ TEST(GradientSumsTest, WindowSumsOfWholeNumbersAreExactAtEverySize) {
       const PixelRegion region{hx + 1u, hy + 1u, hx + 1u + columns, hy + 1u + rows};
       sums.Start(image.data(), stride, region);
       for (int y = hy + 1; y < hy + 1 + rows; ++y) {
-        const float* row = sums.NextRow();
-        for (int x = hx + 1; x < hx + 1 + columns; ++x, row += 4) {
+        gradient_sum_row row = sums.NextRow();
+        for (int x = hx + 1, i = 0; i < columns; ++x, ++i) {
           double a = 0, b = 0, c = 0;
           for (int v = y - hy; v <= y + hy; ++v) {
             for (int u = x - hx; u <= x + hx; ++u) {
@@ -36,9 +36,9 @@ TEST(GradientSumsTest, WindowSumsOfWholeNumbersAreExactAtEverySize) {
               a += ix * ix, b += iy * iy, c += ix * iy;
             }
           }
-          ASSERT_EQ(row[0], static_cast<float>(a)) << x << ',' << y;
-          ASSERT_EQ(row[1], static_cast<float>(b));
-          ASSERT_EQ(row[2], static_cast<float>(c));
+          ASSERT_EQ(row.xx[i], static_cast<float>(a)) << x << ',' << y;
+          ASSERT_EQ(row.yy[i], static_cast<float>(b));
+          ASSERT_EQ(row.xy[i], static_cast<float>(c));
         }
       }
     }
@@ -56,10 +56,10 @@ TEST(GradientSumsTest, StrongTextureLeavesNoTraceBehindIt) {
   GradientSums sums(15, 15, kSide);
   sums.Start(image.data(), kSide, {16, 16, kSide - 16, kSide - 16});
   for (int y = 16; y < kSide - 16; ++y) {
-    const float* row = sums.NextRow();
-    for (int x = 16; x < kSide - 16; ++x, row += 4) {
+    gradient_sum_row row = sums.NextRow();
+    for (int x = 16; x < kSide - 16; ++x) {
       if (x > 76 || y > 76) {
-        ASSERT_NEAR(row[0] + row[1], 0.0f, 1e-6f) << x << "," << y;
+        ASSERT_NEAR(row.xx[x - 16] + row.yy[x - 16], 0.0f, 1e-6f) << x << "," << y;
       }
     }
   }
@@ -68,17 +68,15 @@ TEST(GradientSumsTest, StrongTextureLeavesNoTraceBehindIt) {
 TEST(ScoreRowTest, EigenvaluesElongationAndRoundCorners) {
   // diag(100, 50); diag(100, 5); a straight edge; nothing; a round corner whose radicand rounds
   // below 0.
-  const float round[] = {3.0000002f, 3.0f, 1e-4f, 0};
-  std::vector<float> sums;
+  std::vector<float> xx, yy, xy;
   for (int repeat = 0; repeat < 5; ++repeat) {  // vectors and tail
-    for (const float v :
-         {100.f, 50.f, 0.f, 0.f, 100.f, 5.f, 0.f, 0.f, 50.f, 50.f, 50.f, 0.f, 0.f, 0.f, 0.f, 0.f}) {
-      sums.push_back(v);
-    }
-    sums.insert(sums.end(), round, round + 4);
+    for (const float v : {100.f, 100.f, 50.f, 0.f, 3.0000002f}) xx.push_back(v);
+    for (const float v : {50.f, 5.f, 50.f, 0.f, 3.0f}) yy.push_back(v);
+    for (const float v : {0.f, 0.f, 50.f, 0.f, 1e-4f}) xy.push_back(v);
   }
+  const gradient_sum_row sums{xx.data(), yy.data(), xy.data()};
   std::vector<float> scores(25);
-  ScoreRow(sums.data(), 25, 15.0f, scores.data());
+  ScoreRow(sums, 25, 15.0f, scores.data());
   for (int i = 0; i < 25; i += 5) {
     EXPECT_EQ(scores[i], 100.0f);    // twice the smaller eigenvalue
     EXPECT_EQ(scores[i + 1], 0.0f);  // ratio 20
@@ -86,7 +84,7 @@ TEST(ScoreRowTest, EigenvaluesElongationAndRoundCorners) {
     EXPECT_EQ(scores[i + 3], 0.0f);
     EXPECT_NEAR(scores[i + 4], 6.0f, 2e-3f);
   }
-  ScoreRow(sums.data(), 25, 20.1f, scores.data());
+  ScoreRow(sums, 25, 20.1f, scores.data());
   EXPECT_EQ(scores[1], 10.0f);
 }
 
