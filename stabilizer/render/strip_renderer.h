@@ -30,14 +30,18 @@ class StripRenderer {
 
  private:
   struct cell;
+  struct row_runs;
   struct row_extent {
     double min_y;
     double max_y;
   };
 
   void drawGridRow(std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
-  void drawCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
-  void drawSpan(cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row) const;
+  bool setUpCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row,
+                 cell& q) const;
+  void drawRow(const cell& q, std::int64_t y, row_runs& runs) const;
+  void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row,
+                row_runs& runs) const;
   marrow::stabilization::point2 vertex(std::int32_t c, std::int32_t r) const {
     const std::size_t i =
         2 * (static_cast<std::size_t>(r) * static_cast<std::size_t>(renderer_.cols) +
