@@ -100,6 +100,34 @@ struct StripRenderer<Pixel>::row_runs {
   std::size_t count = 0;
 };
 
+namespace {
+
+// Null where the source has two columns and two rows to interpolate between, or nothing.
+template <class Pixel>
+std::unique_ptr<WorldX<Pixel>> widened(const WorldX<Pixel>& source) {
+  const int width = source.width(), height = source.height();
+  if (width < 1 || height < 1 || (width > 1 && height > 1)) return nullptr;
+  auto twice = std::make_unique<WorldX<Pixel>>(std::max(width, 2), std::max(height, 2));
+  for (int y = 0; y < twice->height(); ++y) {
+    for (int x = 0; x < twice->width(); ++x) {
+      twice->row(y)[x] = source.row(std::min(y, height - 1))[std::min(x, width - 1)];
+    }
+  }
+  return twice;
+}
+
+template <class Pixel>
+source_plane plane(const WorldX<Pixel>& source, double max_x, double max_y) {
+  return {reinterpret_cast<const unsigned char*>(source.data()),
+          source.row_bytes(),
+          source.width(),
+          source.height(),
+          max_x,
+          max_y};
+}
+
+}  // namespace
+
 template <class Pixel>
 StripRenderer<Pixel>::StripRenderer(const Renderer& renderer, const std::vector<double>& vertices,
                                     const WorldX<Pixel>& source, WorldX<Pixel>& destination,
@@ -107,12 +135,10 @@ StripRenderer<Pixel>::StripRenderer(const Renderer& renderer, const std::vector<
     : renderer_(renderer),
       vertices_(vertices),
       destination_(destination),
-      source_{reinterpret_cast<const unsigned char*>(source.data()),
-              source.row_bytes(),
-              source.width(),
-              source.height(),
-              std::min(renderer.sourceWidth, source.width()) - 1.0001,
-              std::min(renderer.sourceHeight, source.height()) - 1.0001},
+      widened_(widened(source)),
+      source_(plane(widened_ ? *widened_ : source,
+                    std::min(renderer.sourceWidth, source.width()) - 1.0001,
+                    std::min(renderer.sourceHeight, source.height()) - 1.0001)),
       crop_(crop),
       zoom_(zoom) {
   const double cx = ((cropRect.right + renderer.boundsMinX) * zoom +

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <vector>
 
 #include "stabilization/cropper.h"
@@ -52,6 +53,7 @@ class StripRenderer {
   const Renderer& renderer_;
   const std::vector<double>& vertices_;
   WorldX<Pixel>& destination_;
+  std::unique_ptr<WorldX<Pixel>> widened_;  // a source of one column or row, that twice
   source_plane source_;
   bool crop_;
   double zoom_;

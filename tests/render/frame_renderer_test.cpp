@@ -327,6 +327,8 @@ TYPED_TEST(FrameRenderer, WideCellsAndOddSizes) {
   expect_as_plain<TypeParam>({.width = 3, .height = 2, .cols = 2, .rows = 2});
   expect_as_plain<TypeParam>({.width = 2, .height = 3, .cols = 2, .rows = 2});
   expect_as_plain<TypeParam>({.width = 1, .height = 1, .cols = 2, .rows = 2});
+  expect_as_plain<TypeParam>({.width = 1, .height = 9, .cols = 2, .rows = 2});
+  expect_as_plain<TypeParam>({.width = 9, .height = 1, .cols = 2, .rows = 2});
 }
 
 TYPED_TEST(FrameRenderer, BrokenMeshes) {
