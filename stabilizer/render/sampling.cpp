@@ -1,298 +1,345 @@
 #include "stabilizer/render/sampling.h"
 
-#include <hwy/cache_control.h>
-
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <type_traits>
 
 // The kernel needs four lanes, so the target of last resort has to be the emulated 128-bit one. The
-// library avoids it under older g++, which miscompile its integer multiplications (GCC bug 106322);
-// there are none here.
+// library avoids it under older g++, which miscompile the high halves of its integer products (GCC
+// bug 106322); there are none here.
 #define HWY_BROKEN_EMU128 0
 #undef HWY_TARGET_INCLUDE
 #define HWY_TARGET_INCLUDE "stabilizer/render/sampling.cpp"
 #include <hwy/foreach_target.h>  // IWYU pragma: keep
 #include <hwy/highway.h>
 
-#ifndef CALMFRAME_SAMPLING_ONCE
-#define CALMFRAME_SAMPLING_ONCE
-
-namespace {
-
-// Four channels as f32, interpolated where the alphas differ; the fast kernel does the rest.
-struct channels {
-  float v[4];  // alpha first
-};
-
-template <bool rounds>
-channels weighted(const channels& p, const channels& q, float t) {
-  const float a = p.v[0];
-  const float b = q.v[0];
-  channels result;
-  if (a == b) {
-    result.v[0] = a * (1 - t) + b * t;
-    if (result.v[0] == 0) return {};
-    for (int i = 1; i < 4; ++i) result.v[i] = p.v[i] * (1 - t) + q.v[i] * t;
-  } else {
-    const float wa = a * (1 - t);
-    const float wb = b * t;
-    result.v[0] = wa + wb;
-    if (result.v[0] == 0) return {};
-    for (int i = 1; i < 4; ++i) result.v[i] = (p.v[i] * wa + q.v[i] * wb) / result.v[0];
-  }
-  if constexpr (rounds) {
-    for (float& v : result.v) v = static_cast<float>(static_cast<std::int32_t>(v + 0.5f));
-  }
-  return result;
-}
-
-}  // namespace
-#endif
-
 HWY_BEFORE_NAMESPACE();
 namespace sampling {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
-template <class D>
-using Bytes = hn::Repartition<std::uint8_t, D>;
+// A vector holds one channel of as many pixels as it has lanes, so that opaque pixels need no work
+// for their alpha and weights no spreading over channels.
+using DF = hn::CappedTag<float, 16>;
+using DU = hn::RebindToUnsigned<DF>;
+using DI = hn::RebindToSigned<DF>;
+using D64 = hn::Repartition<std::uint64_t, DF>;
+using DOffset = hn::RebindToSigned<D64>;
+using VF = hn::Vec<DF>;
+using VU = hn::Vec<DU>;
+using VOffset = hn::Vec<DOffset>;
+using Mask = hn::Mask<DF>;
 
-// How channels become f32 lanes, and lanes that hold whole numbers channels. D is the tag of the
-// lanes: one pixel or two. Loads and stores are of bytes: rows may lie anywhere.
-template <class Channel>
-struct IntegerDepth {
-  using channel = Channel;
-  static constexpr bool rounds = true;
-  template <class D>
-  static HWY_INLINE hn::Vec<Bytes<hn::Rebind<Channel, D>>> Raw(D, const unsigned char* p) {
-    return hn::LoadU(Bytes<hn::Rebind<Channel, D>>(), p);
-  }
-  template <class D, class V>
-  static HWY_INLINE hn::Vec<D> Lanes(D d, V raw) {
-    const auto channels = hn::BitCast(hn::Rebind<Channel, D>(), raw);
-    return hn::ConvertTo(d, hn::PromoteTo(hn::RebindToSigned<D>(), channels));
-  }
-  template <class D>
-  static HWY_INLINE void Store(D d, hn::Vec<D> v, unsigned char* p) {
-    // 2^23 + v has v in its lowest bits.
-    const hn::RebindToSigned<D> di;
-    const auto magic = hn::Set(d, 8388608.0f);
-    const auto whole = hn::Xor(hn::BitCast(di, hn::Add(v, magic)), hn::BitCast(di, magic));
-    const hn::Rebind<Channel, D> dc;
-    const Bytes<hn::Rebind<Channel, D>> db;
-    hn::StoreU(hn::BitCast(db, hn::DemoteTo(dc, whole)), db, p);
-  }
+constexpr std::size_t max_lanes = 16;
+constexpr float whole_bits = 8388608.0f;  // 2^23 + v has v in its lowest bits
+
+// Where output pixels that stand side by side look up the source. Filled run by run: runs are often
+// shorter than a few vectors, stretches are long.
+constexpr int max_stretch = 512;
+struct Stretch {
+  HWY_ALIGN std::int32_t ix[max_stretch + max_lanes];
+  HWY_ALIGN std::int32_t iy[max_stretch + max_lanes];
+  HWY_ALIGN float fx[max_stretch + max_lanes];
+  HWY_ALIGN float fy[max_stretch + max_lanes];
+  int count = 0;
+  unsigned char* out = nullptr;
 };
 
-struct Depth8 : IntegerDepth<std::uint8_t> {
+// One axis of a vector of positions: clamped, then whole and fractional part.
+class Axis {
+ public:
+  Axis(double start, double step, double highest, int size)
+      : base_(std::fabs(start) < 16777216.0 ? std::floor(start) : 0.0),
+        first_(static_cast<float>(start - base_)),
+        step_(static_cast<float>(step)),
+        low_(static_cast<float>(0.0001 - base_)),
+        high_(static_cast<float>(highest - base_)),
+        last_(size - 2) {}
+
+  HWY_INLINE VF Step(VF index) const { return hn::Mul(index, hn::Set(DF(), step_)); }
+  HWY_INLINE void Place(VF offset, std::int32_t* HWY_RESTRICT whole,
+                        float* HWY_RESTRICT fraction) const {
+    const DF d;
+    const DI di;
+    auto p = hn::Add(hn::Set(d, first_), offset);
+    const auto low = hn::Set(d, low_), high = hn::Set(d, high_);
+    p = hn::IfThenElse(hn::Ge(p, low), p, low);  // not a number fails
+    p = hn::IfThenElse(hn::Le(p, high), p, high);
+    const auto floor = hn::Floor(p);
+    // 1.5 * 2^23 has room for both signs.
+    const auto bits = hn::BitCast(di, hn::Add(floor, hn::Set(d, 1.5f * whole_bits)));
+    const auto i = hn::Add(bits, hn::Set(di, static_cast<std::int32_t>(base_) - 0x4B400000));
+    hn::StoreU(hn::Min(hn::Max(i, hn::Zero(di)), hn::Set(di, last_)), di, whole);
+    hn::StoreU(hn::Sub(p, floor), d, fraction);
+  }
+
+ private:
+  double base_;
+  float first_, step_, low_, high_;
+  std::int32_t last_;
+};
+
+template <class Pixel>
+HWY_INLINE void Locate(const source_plane& source, const source_run<Pixel>& run, Stretch& s) {
+  const DF d;
+  const int lanes = static_cast<int>(hn::Lanes(d));
+  const Axis x(run.x, run.dx, source.max_x, source.width);
+  const Axis y(run.y, run.dy, source.max_y, source.height);
+  const float g = static_cast<float>(run.g);
+  auto index = hn::Iota(d, 0.0f);
+  const auto next = hn::Set(d, static_cast<float>(lanes));
+  const auto each = [&](const auto& offset) HWY_ATTR {
+    for (int k = s.count; k < s.count + run.count; k += lanes) {
+      x.Place(offset(x.Step(index)), s.ix + k, s.fx + k);
+      y.Place(offset(y.Step(index)), s.iy + k, s.fy + k);
+      index = hn::Add(index, next);
+    }
+  };
+  if (g == 0) {
+    each([](VF step) HWY_ATTR { return step; });
+  } else {
+    each([&](VF step) HWY_ATTR {
+      return hn::Div(step, hn::Add(hn::Set(d, 1.0f), hn::Mul(hn::Set(d, g), index)));
+    });
+  }
+  s.count += run.count;
+}
+
+// Low and high halves of the 64-bit words at p plus the offsets of a vector's pixels.
+HWY_INLINE void Words(const unsigned char* p, VOffset lower, VOffset upper, VU& low, VU& high) {
+  const auto* base = reinterpret_cast<const std::uint64_t*>(p);
+  const auto first = hn::BitCast(DU(), hn::GatherOffset(D64(), base, lower));
+  const auto second = hn::BitCast(DU(), hn::GatherOffset(D64(), base, upper));
+  low = hn::ConcatEven(DU(), second, first);
+  high = hn::ConcatOdd(DU(), second, first);
+}
+
+HWY_INLINE VF Rounded(VF v) {  // v >= 0
+  return hn::Floor(hn::Add(v, hn::Set(DF(), 0.5f)));
+}
+
+HWY_INLINE VU Bits(VF whole) {
+  return hn::BitCast(DU(), hn::Add(whole, hn::Set(DF(), whole_bits)));
+}
+
+HWY_INLINE VF Lanes(VU v) {
+  return hn::ConvertTo(DF(), hn::BitCast(DI(), v));
+}
+
+// A depth: how neighbours are read into raw channels, up to four vectors a pixel, how these become
+// f32 and how samples are written. Channel 0 is alpha.
+struct Depth8 {
   using Pixel = HX_Pixel8;
+  static constexpr bool rounds = true;
+  static HWY_INLINE void Load(const unsigned char* p, VOffset lower, VOffset upper, VU& left, VU&,
+                              VU&, VU&, VU& right, VU&, VU&, VU&) {
+    Words(p, lower, upper, left, right);
+  }
+  template <int channel>
+  static HWY_INLINE VF Channel(VU r0, VU, VU, VU) {
+    if constexpr (channel == 3) return Lanes(hn::ShiftRight<24>(r0));
+    return Lanes(hn::And(hn::ShiftRight<8 * channel>(r0), hn::Set(DU(), 255)));
+  }
+  static HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU d) {
+    const auto differ = hn::Or(hn::Xor(a, b), hn::Or(hn::Xor(a, c), hn::Xor(a, d)));
+    return hn::AllTrue(DU(), hn::Eq(hn::And(differ, hn::Set(DU(), 255)), hn::Zero(DU())));
+  }
+  static HWY_INLINE void Store(VF alpha, VF red, VF green, VF blue, unsigned char* out) {
+    // What lies above a channel's bits is shifted out or covered.
+    const auto upper = hn::Or(hn::ShiftLeft<16>(Bits(green)), hn::ShiftLeft<24>(Bits(blue)));
+    const auto lower = hn::Or(hn::And(Bits(alpha), hn::Set(DU(), 255)),
+                              hn::ShiftRight<16>(hn::ShiftLeft<24>(Bits(red))));
+    const hn::Repartition<std::uint8_t, DF> bytes;
+    hn::StoreU(hn::BitCast(bytes, hn::Or(upper, lower)), bytes, out);
+  }
 };
 
-struct Depth16 : IntegerDepth<std::uint16_t> {
+struct Depth16 {
   using Pixel = HX_Pixel16;
+  static constexpr bool rounds = true;
+  static HWY_INLINE void Load(const unsigned char* p, VOffset lower, VOffset upper, VU& left0,
+                              VU& left1, VU&, VU&, VU& right0, VU& right1, VU&, VU&) {
+    Words(p, lower, upper, left0, left1);
+    Words(p + sizeof(Pixel), lower, upper, right0, right1);
+  }
+  template <int channel>
+  static HWY_INLINE VF Channel(VU r0, VU r1, VU, VU) {
+    const VU r = channel < 2 ? r0 : r1;
+    if constexpr (channel % 2 == 1) return Lanes(hn::ShiftRight<16>(r));
+    return Lanes(hn::And(r, hn::Set(DU(), 65535)));
+  }
+  static HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU d) {
+    const auto differ = hn::Or(hn::Xor(a, b), hn::Or(hn::Xor(a, c), hn::Xor(a, d)));
+    return hn::AllTrue(DU(), hn::Eq(hn::And(differ, hn::Set(DU(), 65535)), hn::Zero(DU())));
+  }
+  static HWY_INLINE void Store(VF alpha, VF red, VF green, VF blue, unsigned char* out) {
+    const auto mask = hn::Set(DU(), 65535);
+    hn::StoreInterleaved2(hn::Or(hn::And(Bits(alpha), mask), hn::ShiftLeft<16>(Bits(red))),
+                          hn::Or(hn::And(Bits(green), mask), hn::ShiftLeft<16>(Bits(blue))), DU(),
+                          reinterpret_cast<std::uint32_t*>(out));
+  }
 };
 
 struct DepthFloat {
   using Pixel = HX_PixelFloat;
-  using channel = float;
   static constexpr bool rounds = false;
-  template <class D>
-  static HWY_INLINE hn::Vec<Bytes<D>> Raw(D, const unsigned char* p) {
-    return hn::LoadU(Bytes<D>(), p);
+  static HWY_INLINE void Load(const unsigned char* p, VOffset lower, VOffset upper, VU& left0,
+                              VU& left1, VU& left2, VU& left3, VU& right0, VU& right1, VU& right2,
+                              VU& right3) {
+    Words(p, lower, upper, left0, left1);
+    Words(p + 8, lower, upper, left2, left3);
+    Words(p + 16, lower, upper, right0, right1);
+    Words(p + 24, lower, upper, right2, right3);
   }
-  template <class D, class V>
-  static HWY_INLINE hn::Vec<D> Lanes(D d, V raw) {
-    return hn::BitCast(d, raw);
+  template <int channel>
+  static HWY_INLINE VF Channel(VU r0, VU r1, VU r2, VU r3) {
+    return hn::BitCast(DF(), channel == 0 ? r0 : channel == 1 ? r1 : channel == 2 ? r2 : r3);
   }
-  template <class D>
-  static HWY_INLINE void Store(D, hn::Vec<D> v, unsigned char* p) {
-    const Bytes<D> db;
-    hn::StoreU(hn::BitCast(db, v), db, p);
+  static HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU d) {
+    const auto first = hn::BitCast(DF(), a);
+    const auto as_first = [&](VU other)
+                              HWY_ATTR { return hn::Eq(first, hn::BitCast(DF(), other)); };
+    return hn::AllTrue(DF(), hn::And(as_first(b), hn::And(as_first(c), as_first(d))));
+  }
+  static HWY_INLINE void Store(VF alpha, VF red, VF green, VF blue, unsigned char* out) {
+    hn::StoreInterleaved4(alpha, red, green, blue, DF(), reinterpret_cast<float*>(out));
   }
 };
 
-struct Positions {
-  HWY_ALIGN std::int32_t ix[max_run];
-  HWY_ALIGN std::int32_t iy[max_run];
-  HWY_ALIGN float fx[max_run];
-  HWY_ALIGN float fy[max_run];
-};
-
-// One axis of a run: whole and fractional parts of the clamped positions.
-HWY_INLINE void AxisPositions(double start, double step, float g, double highest, int size,
-                              int count, std::int32_t* HWY_RESTRICT whole,
-                              float* HWY_RESTRICT fraction) {
-  const hn::CappedTag<float, max_run> d;
-  const hn::RebindToSigned<decltype(d)> di;
-  const std::size_t lanes = hn::Lanes(d);
-  const double base = std::fabs(start) < 16777216.0 ? std::floor(start) : 0.0;
-  const auto first = hn::Set(d, static_cast<float>(start - base));
-  const auto low = hn::Set(d, static_cast<float>(0.0001 - base));
-  const auto high = hn::Set(d, static_cast<float>(highest - base));
-  const auto one = hn::Set(d, 1.0f);
-  const auto base_whole = hn::Set(di, static_cast<std::int32_t>(base));
-  const auto last = hn::Set(di, size > 1 ? size - 2 : 0);
-  for (std::size_t k = 0; k < static_cast<std::size_t>(count); k += lanes) {
-    const auto index = hn::Iota(d, static_cast<float>(k));
-    const auto offset = hn::Div(hn::Mul(index, hn::Set(d, static_cast<float>(step))),
-                                hn::Add(one, hn::Mul(hn::Set(d, g), index)));
-    auto p = hn::Add(first, offset);
-    p = hn::IfThenElse(hn::Ge(p, low), p, low);  // not a number fails
-    p = hn::IfThenElse(hn::Le(p, high), p, high);
-    const auto floor = hn::Floor(p);
-    auto i = hn::Add(hn::ConvertTo(di, floor), base_whole);
-    i = hn::Min(hn::Max(i, hn::Zero(di)), last);
-    hn::Store(i, di, whole + k);
-    hn::Store(hn::Sub(p, floor), d, fraction + k);
-  }
-}
-
-template <class Depth, class D>
-HWY_INLINE hn::Vec<D> Between(D d, hn::Vec<D> p, hn::Vec<D> q, hn::Vec<D> t) {
-  const auto s = hn::Sub(hn::Set(d, 1.0f), t);
+template <class Depth>
+HWY_INLINE VF Between(VF p, VF q, VF s, VF t) {
   const auto v = hn::Add(hn::Mul(p, s), hn::Mul(q, t));
   if constexpr (Depth::rounds) {
-    return hn::Floor(hn::Add(v, hn::Set(d, 0.5f)));  // v >= 0
+    return Rounded(v);
   } else {
     return v;
   }
 }
 
-// The source about a run's pixels.
-struct Neighbours {
-  const source_plane& source;
-  const Positions& at;
-  std::ptrdiff_t pixel;  // bytes
-
-  const unsigned char* operator[](int k) const {
-    return source.data + source.row_bytes * at.iy[k] + pixel * at.ix[k];
+// The interpolation at t = 1 - s between pixels of the alphas a and b. Where these are equal, what
+// weighs a colour is the fraction alone.
+template <class Depth>
+class Weights {
+ public:
+  HWY_INLINE Weights(VF a, VF b, VF s, VF t)
+      : p_(hn::Mul(a, s)), q_(hn::Mul(b, t)), alpha_(hn::Add(p_, q_)) {
+    const DF d;
+    const auto equal = hn::Eq(a, b);
+    p_ = hn::IfThenElse(equal, s, p_);
+    q_ = hn::IfThenElse(equal, t, q_);
+    divisor_ = hn::IfThenElse(equal, hn::Set(d, 1.0f), alpha_);
+    nothing_ = hn::Eq(alpha_, hn::Zero(d));
   }
+  HWY_INLINE VF Alpha() const { return Stored(alpha_); }
+  HWY_INLINE VF Colour(VF p, VF q) const {
+    return Stored(hn::Div(hn::Add(hn::Mul(p, p_), hn::Mul(q, q_)), divisor_));
+  }
+
+ private:
+  HWY_INLINE VF Stored(VF v) const {
+    if constexpr (Depth::rounds) v = Rounded(v);
+    return hn::IfThenZeroElse(nothing_, v);
+  }
+
+  VF p_, q_, alpha_, divisor_;
+  Mask nothing_;
 };
 
-#if HWY_MAX_BYTES >= 32 && !HWY_HAVE_SCALABLE
-#define CALMFRAME_PAIRS 1
-// Two pixels at a time, each from two loads of two neighbours, as if all alphas were equal. False
-// where they are not, or are 0 or not a number; the samples then are of no use.
 template <class Depth>
-HWY_INLINE bool RunOfOneAlpha(const source_plane& source, const Positions& at, int count,
-                              unsigned char* out) {
-  using channel = typename Depth::channel;
-  constexpr std::ptrdiff_t pixel = sizeof(typename Depth::Pixel);
-  const hn::FixedTag<float, 8> d;
-  const Bytes<hn::Rebind<channel, decltype(d)>> db;
-  const Neighbours neighbours{source, at, pixel};
-  HWY_ALIGN unsigned char bytes[2 * pixel];
-  std::memcpy(bytes, neighbours[0], pixel);
-  std::memcpy(bytes + pixel, neighbours[0], pixel);
-  const auto first = hn::Load(db, bytes);
-  auto differ = hn::Zero(db);
-  const auto columns = [&](int k) HWY_ATTR {
-    const unsigned char* p = neighbours[k];
-    const auto top = Depth::Raw(d, p);
-    const auto bottom = Depth::Raw(d, p + source.row_bytes);
-    differ = hn::Or(differ, hn::Or(hn::Xor(top, first), hn::Xor(bottom, first)));
-    return Between<Depth>(d, Depth::Lanes(d, top), Depth::Lanes(d, bottom), hn::Set(d, at.fy[k]));
-  };
-  // One more than an odd count: its position is computed too.
-  for (int k = 0; k < count; k += 2, out += 2 * pixel) {
-    const auto even = columns(k);
-    const auto odd = columns(k + 1);
-    const auto tx = hn::OddEvenBlocks(hn::Set(d, at.fx[k + 1]), hn::Set(d, at.fx[k]));
-    const auto sample = Between<Depth>(d, hn::ConcatLowerLower(d, odd, even),
-                                       hn::ConcatUpperUpper(d, odd, even), tx);
-    if (k + 1 < count) {
-      Depth::Store(d, sample, out);
+HWY_INLINE void Sample(const source_plane& source, Stretch& s) {
+  using Pixel = typename Depth::Pixel;
+  const DF d;
+  const DI di;
+  const DOffset dofs;
+  const hn::Half<DI> half;
+  const int lanes = static_cast<int>(hn::Lanes(d));
+  const auto row_bytes = hn::Set(di, static_cast<std::int32_t>(source.row_bytes));
+  const auto pixel_bytes = hn::Set(di, static_cast<std::int32_t>(sizeof(Pixel)));
+  const unsigned char* below = source.data + source.row_bytes;
+  // The last vector reads the top left in the lanes that are left over.
+  for (std::int32_t* whole : {s.ix, s.iy}) hn::StoreU(hn::Zero(di), di, whole + s.count);
+  for (float* part : {s.fx, s.fy}) hn::StoreU(hn::Zero(d), d, part + s.count);
+
+  for (int k = 0; k < s.count; k += lanes) {
+    const auto ix = hn::Load(di, s.ix + k), iy = hn::Load(di, s.iy + k);
+    const auto offset = [&](auto x, auto y) HWY_ATTR {
+      const auto bytes = [&](auto v, auto unit) HWY_ATTR {
+        return hn::MulEven(hn::BitCast(di, hn::PromoteTo(dofs, v)), unit);
+      };
+      return hn::Add(bytes(y, row_bytes), bytes(x, pixel_bytes));
+    };
+    const auto lower = offset(hn::LowerHalf(half, ix), hn::LowerHalf(half, iy));
+    const auto upper = offset(hn::UpperHalf(half, ix), hn::UpperHalf(half, iy));
+    // Corners a b above c d.
+    VU a0, a1, a2, a3, b0, b1, b2, b3, c0, c1, c2, c3, d0, d1, d2, d3;
+    a0 = a1 = a2 = a3 = b0 = b1 = b2 = b3 = hn::Zero(DU());
+    c0 = c1 = c2 = c3 = d0 = d1 = d2 = d3 = hn::Zero(DU());
+    Depth::Load(source.data, lower, upper, a0, a1, a2, a3, b0, b1, b2, b3);
+    Depth::Load(below, lower, upper, c0, c1, c2, c3, d0, d1, d2, d3);
+    const auto tx = hn::Load(d, s.fx + k), ty = hn::Load(d, s.fy + k);
+    const auto sx = hn::Sub(hn::Set(d, 1.0f), tx), sy = hn::Sub(hn::Set(d, 1.0f), ty);
+
+    VF alpha, red, green, blue;
+    const auto of_channels = [&](const auto& sample) HWY_ATTR {
+      const auto channel = [&](auto i) HWY_ATTR {
+        return sample(
+            Depth::template Channel<i>(a0, a1, a2, a3), Depth::template Channel<i>(b0, b1, b2, b3),
+            Depth::template Channel<i>(c0, c1, c2, c3), Depth::template Channel<i>(d0, d1, d2, d3));
+      };
+      red = channel(std::integral_constant<int, 1>());
+      green = channel(std::integral_constant<int, 2>());
+      blue = channel(std::integral_constant<int, 3>());
+    };
+    if (Depth::OneAlpha(a0, b0, c0, d0)) {
+      const auto sample = [&](VF a, VF b, VF c, VF e) HWY_ATTR {
+        return Between<Depth>(Between<Depth>(a, c, sy, ty), Between<Depth>(b, e, sy, ty), sx, tx);
+      };
+      of_channels(sample);
+      alpha = Depth::template Channel<0>(a0, a1, a2, a3);
+      const auto nothing = hn::Eq(alpha, hn::Zero(d));
+      if constexpr (!Depth::rounds) alpha = sample(alpha, alpha, alpha, alpha);
+      alpha = hn::IfThenZeroElse(nothing, alpha);
+      red = hn::IfThenZeroElse(nothing, red);
+      green = hn::IfThenZeroElse(nothing, green);
+      blue = hn::IfThenZeroElse(nothing, blue);
     } else {
-      Depth::Store(hn::Half<decltype(d)>(), hn::LowerHalf(sample), out);
+      const Weights<Depth> left(Depth::template Channel<0>(a0, a1, a2, a3),
+                                Depth::template Channel<0>(c0, c1, c2, c3), sy, ty);
+      const Weights<Depth> right(Depth::template Channel<0>(b0, b1, b2, b3),
+                                 Depth::template Channel<0>(d0, d1, d2, d3), sy, ty);
+      const Weights<Depth> both(left.Alpha(), right.Alpha(), sx, tx);
+      of_channels([&](VF a, VF b, VF c, VF e)
+                      HWY_ATTR { return both.Colour(left.Colour(a, c), right.Colour(b, e)); });
+      alpha = both.Alpha();
+    }
+    unsigned char* out = s.out + static_cast<std::ptrdiff_t>(sizeof(Pixel)) * k;
+    if (k + lanes <= s.count) {
+      Depth::Store(alpha, red, green, blue, out);
+    } else {
+      HWY_ALIGN unsigned char rest[max_lanes * sizeof(Pixel)];
+      Depth::Store(alpha, red, green, blue, rest);
+      std::memcpy(out, rest, sizeof(Pixel) * static_cast<std::size_t>(s.count - k));
     }
   }
-  hn::Store(differ, db, bytes);
-  channel left, right, alpha;
-  std::memcpy(&left, bytes, sizeof(left));
-  std::memcpy(&right, bytes + pixel, sizeof(right));
-  std::memcpy(&alpha, neighbours[0], sizeof(alpha));
-  return left == 0 && right == 0 && alpha != 0 && alpha == alpha;
-}
-#endif
-
-template <class Pixel>
-HWY_INLINE void Locate(const source_plane& source, const source_run<Pixel>& run, Positions& at) {
-  const float g = static_cast<float>(run.g);
-  AxisPositions(run.x, run.dx, g, source.max_x, source.width, run.count, at.ix, at.fx);
-  AxisPositions(run.y, run.dy, g, source.max_y, source.height, run.count, at.iy, at.fy);
-  // Rows of a cell are too short for the processor to foresee. The row above is there already, from
-  // the run before.
-  const Neighbours neighbours{source, at, sizeof(Pixel)};
-  const std::ptrdiff_t below = source.height > 1 ? source.row_bytes : 0;
-  hwy::Prefetch(neighbours[0] + below);
-  hwy::Prefetch(neighbours[run.count - 1] + below);
-  hwy::Prefetch(run.out);
-  hwy::Prefetch(run.out + run.count - 1);
+  s.count = 0;
 }
 
 template <class Depth>
-HWY_INLINE void Sample(const source_plane& source, const Positions& at, int count,
-                       typename Depth::Pixel* out_pixels) {
-  using channel = typename Depth::channel;
-  const hn::FixedTag<float, 4> d;
-  constexpr std::ptrdiff_t pixel = sizeof(typename Depth::Pixel);
-  auto* out = reinterpret_cast<unsigned char*>(out_pixels);
-#ifdef CALMFRAME_PAIRS
-  if (source.width > 1 && source.height > 1 && RunOfOneAlpha<Depth>(source, at, count, out)) {
-    return;
-  }
-#endif
-  const std::ptrdiff_t right = source.width > 1 ? pixel : 0;
-  const std::ptrdiff_t below = source.height > 1 ? source.row_bytes : 0;
-  const Neighbours neighbours{source, at, pixel};
-  for (int k = 0; k < count; ++k, out += pixel) {
-    const unsigned char* p = neighbours[k];
-    channel a00, a10, a01, a11;
-    std::memcpy(&a00, p, sizeof(a00));
-    std::memcpy(&a10, p + right, sizeof(a10));
-    std::memcpy(&a01, p + below, sizeof(a01));
-    std::memcpy(&a11, p + below + right, sizeof(a11));
-    const auto p00 = Depth::Lanes(d, Depth::Raw(d, p));
-    const auto p10 = Depth::Lanes(d, Depth::Raw(d, p + right));
-    const auto p01 = Depth::Lanes(d, Depth::Raw(d, p + below));
-    const auto p11 = Depth::Lanes(d, Depth::Raw(d, p + below + right));
-    if (a00 == a10 && a00 == a01 && a00 == a11) {
-      if (a00 == 0) {
-        std::memset(out, 0, pixel);
-        continue;
-      }
-      const auto ty = hn::Set(d, at.fy[k]);
-      Depth::Store(d,
-                   Between<Depth>(d, Between<Depth>(d, p00, p01, ty),
-                                  Between<Depth>(d, p10, p11, ty), hn::Set(d, at.fx[k])),
-                   out);
-      continue;
-    }
-    channels c00, c10, c01, c11;
-    hn::StoreU(p00, d, c00.v);
-    hn::StoreU(p10, d, c10.v);
-    hn::StoreU(p01, d, c01.v);
-    hn::StoreU(p11, d, c11.v);
-    const channels mixed =
-        weighted<Depth::rounds>(weighted<Depth::rounds>(c00, c01, at.fy[k]),
-                                weighted<Depth::rounds>(c10, c11, at.fy[k]), at.fx[k]);
-    channel rounded[4];
-    for (int i = 0; i < 4; ++i) rounded[i] = static_cast<channel>(mixed.v[i]);
-    std::memcpy(out, rounded, pixel);
-  }
-}
-
-// The positions of the run ahead are found before a run is sampled, to hide their latency.
-template <class Depth>
-void Runs(const source_plane& source, const source_run<typename Depth::Pixel>* runs,
-          std::size_t n) {
-  Positions at[2];
-  if (n > 0) Locate(source, runs[0], at[0]);
+HWY_INLINE void Runs(const source_plane& source, const source_run<typename Depth::Pixel>* runs,
+                     std::size_t n) {
+  Stretch s;
+  const typename Depth::Pixel* end = nullptr;
   for (std::size_t i = 0; i < n; ++i) {
-    if (i + 1 < n) Locate(source, runs[i + 1], at[(i + 1) % 2]);
-    Sample<Depth>(source, at[i % 2], runs[i].count, runs[i].out);
+    const auto& run = runs[i];
+    if (s.count > 0 && (run.out != end || s.count + run.count > max_stretch)) {
+      Sample<Depth>(source, s);
+    }
+    if (s.count == 0) s.out = reinterpret_cast<unsigned char*>(run.out);
+    Locate(source, run, s);
+    end = run.out + run.count;
   }
+  if (s.count > 0) Sample<Depth>(source, s);
 }
 
 void Runs8(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n) {
@@ -305,7 +352,6 @@ void RunsFloat(const source_plane& source, const source_run<HX_PixelFloat>* runs
   Runs<DepthFloat>(source, runs, n);
 }
 
-#undef CALMFRAME_PAIRS
 }  // namespace HWY_NAMESPACE
 }  // namespace sampling
 HWY_AFTER_NAMESPACE();

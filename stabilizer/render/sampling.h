@@ -21,8 +21,8 @@ struct source_run {
 
 struct source_plane {
   const unsigned char* data;  // any alignment
-  std::ptrdiff_t row_bytes;
-  int width;  // at least 1
+  std::ptrdiff_t row_bytes;   // of 32 bits
+  int width;                  // 2 .. 2^22, as there are always two neighbours to read
   int height;
   double max_x;  // positions are clamped to 0.0001 .. max_x
   double max_y;
@@ -32,7 +32,8 @@ struct source_plane {
 // stays below 2e-5 pixels wherever in the source the run lies.
 inline constexpr int max_run = 64;
 
-// Writes the samples of each run in turn. Colours are weighted by alpha; where no neighbour has any
+// Writes the samples of each run in turn; quickest where each begins at the pixel past the one
+// before. Colours are weighted by alpha; where no neighbour has any
 // the sample is all zero. Positions that are not finite sample the top left.
 void SampleRuns(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n);
 void SampleRuns(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n);

@@ -34,9 +34,9 @@ struct edge {
       if (!inside(x0)) x1 = x0;
       return;
     }
-    const double meet = (from.x + slope * (y - from.y)) * zoom;
-    std::int64_t x = static_cast<std::int64_t>(
-        std::clamp(std::floor(meet), static_cast<double>(x0), static_cast<double>(x1)));
+    const double meet = (from.x + slope * (y - from.y)) * zoom + 1;
+    auto x = static_cast<std::int64_t>(
+        std::clamp(meet, static_cast<double>(x0), static_cast<double>(x1)));
     if (dy > 0) {  // a stretch that begins at x0; find the first x past it
       while (x < x1 && inside(x)) ++x;
       while (x > x0 && !inside(x - 1)) --x;
@@ -46,6 +46,12 @@ struct edge {
       while (x > x0 && inside(x - 1)) --x;
       x0 = x;
     }
+  }
+  // The same, quicker where the row seldom meets the edge.
+  void cutSeldom(double zoom, const double* test_x, double y, std::int64_t& x0,
+                 std::int64_t& x1) const {
+    if (x0 >= x1 || (cross(test_x[x0], y) >= 0 && cross(test_x[x1 - 1], y) >= 0)) return;
+    cut(zoom, test_x, y, x0, x1);
   }
 
   // Squared distance of the edge's line.
@@ -64,14 +70,55 @@ edge between(point2 a, point2 b) {
 
 }  // namespace
 
+// What of a cell has to be drawn, in the zoomed plane.
 template <class Pixel>
 struct StripRenderer<Pixel>::cell {
   std::int32_t c;
   std::int32_t r;
+  std::int64_t x0;
+  std::int64_t x1;
+  std::int64_t y0;
+  std::int64_t y1;
   matrix3 square_from_plane;
-  std::array<source_run<Pixel>, 32> runs;  // not drawn yet; about as many as a cell has rows
-  std::size_t run_count;
+  std::array<edge, 4> edges;  // top, right, bottom, left
+  std::array<bool, 4> owned;  // outer edges of the grid
+  bool border;
 };
+
+// Runs of a row that are not drawn yet.
+template <class Pixel>
+struct StripRenderer<Pixel>::row_runs {
+  std::array<source_run<Pixel>, 128> runs;
+  std::size_t count = 0;
+};
+
+namespace {
+
+// Null where the source has two columns and two rows to interpolate between, or nothing.
+template <class Pixel>
+std::unique_ptr<WorldX<Pixel>> widened(const WorldX<Pixel>& source) {
+  const int width = source.width(), height = source.height();
+  if (width < 1 || height < 1 || (width > 1 && height > 1)) return nullptr;
+  auto twice = std::make_unique<WorldX<Pixel>>(std::max(width, 2), std::max(height, 2));
+  for (int y = 0; y < twice->height(); ++y) {
+    for (int x = 0; x < twice->width(); ++x) {
+      twice->row(y)[x] = source.row(std::min(y, height - 1))[std::min(x, width - 1)];
+    }
+  }
+  return twice;
+}
+
+template <class Pixel>
+source_plane plane(const WorldX<Pixel>& source, double max_x, double max_y) {
+  return {reinterpret_cast<const unsigned char*>(source.data()),
+          source.row_bytes(),
+          source.width(),
+          source.height(),
+          max_x,
+          max_y};
+}
+
+}  // namespace
 
 template <class Pixel>
 StripRenderer<Pixel>::StripRenderer(const FrameMesh& mesh, const WorldX<Pixel>& source,
@@ -79,12 +126,10 @@ StripRenderer<Pixel>::StripRenderer(const FrameMesh& mesh, const WorldX<Pixel>& 
     : FrameMesh(mesh),
       destination_(destination),
       only_(only),
-      source_{reinterpret_cast<const unsigned char*>(source.data()),
-              source.row_bytes(),
-              source.width(),
-              source.height(),
-              std::min(renderer_.sourceWidth, source.width()) - 1.0001,
-              std::min(renderer_.sourceHeight, source.height()) - 1.0001},
+      widened_(widened(source)),
+      source_(plane(widened_ ? *widened_ : source,
+                    std::min(renderer_.sourceWidth, source.width()) - 1.0001,
+                    std::min(renderer_.sourceHeight, source.height()) - 1.0001)),
       band_height_(only ? TileMap::side : band_rows),
       tolerance2_(std::max(4.0, 4.0 / (zoom_ * zoom_))) {
   for (int x = 0; x < destination.width(); ++x) {
@@ -119,14 +164,35 @@ void StripRenderer<Pixel>::drawGridRow(std::int32_t r, std::int64_t first_row,
           static_cast<double>(first_row)) {
     return;
   }
-  for (std::int32_t c = 0; c + 1 < renderer_.cols; ++c) drawCell(c, r, first_row, end_row);
+  std::vector<cell> cells;
+  cells.reserve(static_cast<std::size_t>(renderer_.cols));
+  cell next;
+  for (std::int32_t c = 0; c + 1 < renderer_.cols; ++c) {
+    if (setUpCell(c, r, first_row, end_row, next)) cells.push_back(next);
+  }
+  // Row by row: source and destination are walked as they lie in memory, and the runs of
+  // neighbouring cells join.
+  std::int64_t y0 = end_row - to_destination_y_;
+  std::int64_t y1 = first_row - to_destination_y_;
+  for (const cell& q : cells) {
+    y0 = std::min(y0, q.y0);
+    y1 = std::max(y1, q.y1);
+  }
+  row_runs runs;
+  for (std::int64_t y = y0; y < y1; ++y) {
+    for (const cell& q : cells) {
+      if (y >= q.y0 && y < q.y1) drawRow(q, y, runs);
+    }
+    SampleRuns(source_, runs.runs.data(), runs.count);
+    runs.count = 0;
+  }
 }
 
 template <class Pixel>
-void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t first_row,
-                                    std::int64_t end_row) const {
+bool StripRenderer<Pixel>::setUpCell(std::int32_t c, std::int32_t r, std::int64_t first_row,
+                                     std::int64_t end_row, cell& q) const {
   cell_bounds bounds;
-  if (!cellBounds(c, r, bounds)) return;
+  if (!cellBounds(c, r, bounds)) return false;
 
   const bool top = r == 0;
   const bool bottom = r == renderer_.rows - 2;
@@ -149,70 +215,72 @@ void StripRenderer<Pixel>::drawCell(std::int32_t c, std::int32_t r, std::int64_t
   const std::int64_t x1 = std::min(bounds.x1, window_x1 - to_destination_x_);
   const std::int64_t y0 = std::max(bounds.y0, window_y0 - to_destination_y_);
   const std::int64_t y1 = std::min(bounds.y1, window_y1 - to_destination_y_);
-  if (x0 >= x1 || y0 >= y1) return;
+  if (x0 >= x1 || y0 >= y1) return false;
   // Whole cells: a span's samples depend on where it begins.
   if (only_ && !only_->touches(x0 + to_destination_x_, y0 + to_destination_y_,
                                x1 + to_destination_x_, y1 + to_destination_y_)) {
-    return;
+    return false;
   }
 
   const point2 p00 = vertex(c, r);
   const point2 p10 = vertex(c + 1, r);
   const point2 p01 = vertex(c, r + 1);
   const point2 p11 = vertex(c + 1, r + 1);
-  cell q;
-  q.c = c;
-  q.r = r;
-  q.square_from_plane =
-      marrow::stabilization::inverse(marrow::stabilization::square_to_quad(p00, p10, p01, p11));
-  q.run_count = 0;
-  for (const double entry : q.square_from_plane) {
-    if (!std::isfinite(entry)) return;  // the quadrilateral has no inside
-  }
-  const edge edges[4] = {between(p00, p10), between(p10, p11), between(p11, p01),
-                         between(p01, p00)};
-  const bool owned[4] = {top, right, bottom, left};
+  q = {c,
+       r,
+       x0,
+       x1,
+       y0,
+       y1,
+       marrow::stabilization::inverse(marrow::stabilization::square_to_quad(p00, p10, p01, p11)),
+       {between(p00, p10), between(p10, p11), between(p11, p01), between(p01, p00)},
+       {top, right, bottom, left},
+       border};
+  // Otherwise the quadrilateral has no inside.
+  return std::all_of(q.square_from_plane.begin(), q.square_from_plane.end(),
+                     [](double entry) { return std::isfinite(entry); });
+}
+
+template <class Pixel>
+void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, row_runs& runs) const {
+  const double py = (static_cast<double>(y) + offset_y_) / zoom_;
+  if (!(py < renderer_.planeHeight)) return;
+  const double test_y = static_cast<double>(y) / zoom_;
   const double* test_x = test_x_.data() + to_destination_x_;
+  Pixel* row = destination_.row(static_cast<int>(y + to_destination_y_));
 
-  for (std::int64_t y = y0; y < y1; ++y) {
-    const double py = (static_cast<double>(y) + offset_y_) / zoom_;
-    if (!(py < renderer_.planeHeight)) break;
-    const double test_y = static_cast<double>(y) / zoom_;
-    Pixel* row = destination_.row(static_cast<int>(y + to_destination_y_));
-
-    std::int64_t inside0 = x0;
-    std::int64_t inside1 = x1;
-    for (const edge& e : edges) e.cut(zoom_, test_x, test_y, inside0, inside1);
-    if (!border) {
-      drawSpan(q, inside0, inside1, py, row);
-      continue;
-    }
-    // A border cell also takes what lies near an outer edge that it owns.
-    if (inside0 >= inside1) inside0 = inside1 = x1;
-    const auto near = [&](std::int64_t x) {
-      for (int i = 0; i < 4; ++i) {
-        if (owned[i] && edges[i].distance2(test_x[x], test_y) < tolerance2_) {
-          return true;
-        }
-      }
-      return false;
-    };
-    std::int64_t begin = x0;
-    for (std::int64_t x = x0; x < x1; ++x) {
-      if (x == inside0) x = inside1;
-      if (x < x1 && near(x)) continue;
-      drawSpan(q, begin, std::min(x, x1), py, row);
-      begin = x + 1;
-    }
-    drawSpan(q, begin, x1, py, row);
+  std::int64_t inside0 = q.x0;
+  std::int64_t inside1 = q.x1;
+  q.edges[0].cutSeldom(zoom_, test_x, test_y, inside0, inside1);
+  q.edges[1].cut(zoom_, test_x, test_y, inside0, inside1);
+  q.edges[2].cutSeldom(zoom_, test_x, test_y, inside0, inside1);
+  q.edges[3].cut(zoom_, test_x, test_y, inside0, inside1);
+  if (!q.border) {
+    drawSpan(q, inside0, inside1, py, row, runs);
+    return;
   }
-  SampleRuns(source_, q.runs.data(), q.run_count);
+  // A border cell also takes what lies near an outer edge that it owns.
+  if (inside0 >= inside1) inside0 = inside1 = q.x1;
+  const auto near = [&](std::int64_t x) {
+    for (std::size_t i = 0; i < q.edges.size(); ++i) {
+      if (q.owned[i] && q.edges[i].distance2(test_x[x], test_y) < tolerance2_) return true;
+    }
+    return false;
+  };
+  std::int64_t begin = q.x0;
+  for (std::int64_t x = q.x0; x < q.x1; ++x) {
+    if (x == inside0) x = inside1;
+    if (x < q.x1 && near(x)) continue;
+    drawSpan(q, begin, std::min(x, q.x1), py, row, runs);
+    begin = x + 1;
+  }
+  drawSpan(q, begin, q.x1, py, row, runs);
 }
 
 // Plane positions of the row's pixels are ((x + offset) / zoom, py).
 template <class Pixel>
-void StripRenderer<Pixel>::drawSpan(cell& q, std::int64_t x0, std::int64_t x1, double py,
-                                    Pixel* row) const {
+void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py,
+                                    Pixel* row, row_runs& runs) const {
   const auto plane_x = [&](std::int64_t x) { return (static_cast<double>(x) + offset_x_) / zoom_; };
   while (x0 < x1 && !(plane_x(x1 - 1) < renderer_.planeWidth)) --x1;
   const matrix3& h = q.square_from_plane;
@@ -223,16 +291,16 @@ void StripRenderer<Pixel>::drawSpan(cell& q, std::int64_t x0, std::int64_t x1, d
     const double v = (h[3] * px + h[4] * py + h[5]) * inverse_w;
     // u(x + k) - u(x) = k (h0 - u h6) / zoom / (w + k h6 / zoom), and v likewise.
     const double step = inverse_w / zoom_;
-    q.runs[q.run_count++] = {(q.c + u) * renderer_.cellWidth - 0.5,
-                             (q.r + v) * renderer_.cellHeight - 0.5,
-                             (h[0] - u * h[6]) * step * renderer_.cellWidth,
-                             (h[3] - v * h[6]) * step * renderer_.cellHeight,
-                             h[6] * step,
-                             static_cast<int>(std::min<std::int64_t>(max_run, x1 - x)),
-                             row + (x + to_destination_x_)};
-    if (q.run_count < q.runs.size()) continue;
-    SampleRuns(source_, q.runs.data(), q.run_count);
-    q.run_count = 0;
+    runs.runs[runs.count++] = {(q.c + u) * renderer_.cellWidth - 0.5,
+                               (q.r + v) * renderer_.cellHeight - 0.5,
+                               (h[0] - u * h[6]) * step * renderer_.cellWidth,
+                               (h[3] - v * h[6]) * step * renderer_.cellHeight,
+                               h[6] * step,
+                               static_cast<int>(std::min<std::int64_t>(max_run, x1 - x)),
+                               row + (x + to_destination_x_)};
+    if (runs.count < runs.runs.size()) continue;
+    SampleRuns(source_, runs.runs.data(), runs.count);
+    runs.count = 0;
   }
 }
 

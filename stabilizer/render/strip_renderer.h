@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <vector>
 
 #include "stabilizer/render/frame_mesh.h"
@@ -27,13 +28,18 @@ class StripRenderer : FrameMesh {
 
  private:
   struct cell;
+  struct row_runs;
 
   void drawGridRow(std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
-  void drawCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
-  void drawSpan(cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row) const;
+  bool setUpCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row,
+                 cell& q) const;
+  void drawRow(const cell& q, std::int64_t y, row_runs& runs) const;
+  void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row,
+                row_runs& runs) const;
 
   WorldX<Pixel>& destination_;
   const TileMap* only_;
+  std::unique_ptr<WorldX<Pixel>> widened_;  // a source of one column or row, that twice
   source_plane source_;
   std::int64_t band_height_;
   double tolerance2_;

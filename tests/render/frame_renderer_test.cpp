@@ -1,6 +1,7 @@
 #include "stabilizer/render/frame_renderer.h"
 
 #include <gtest/gtest.h>
+#include <hwy/highway.h>
 #include <tbb/global_control.h>
 
 #include <boost/make_shared.hpp>
@@ -326,6 +327,8 @@ TYPED_TEST(FrameRenderer, WideCellsAndOddSizes) {
   expect_as_plain<TypeParam>({.width = 3, .height = 2, .cols = 2, .rows = 2});
   expect_as_plain<TypeParam>({.width = 2, .height = 3, .cols = 2, .rows = 2});
   expect_as_plain<TypeParam>({.width = 1, .height = 1, .cols = 2, .rows = 2});
+  expect_as_plain<TypeParam>({.width = 1, .height = 9, .cols = 2, .rows = 2});
+  expect_as_plain<TypeParam>({.width = 9, .height = 1, .cols = 2, .rows = 2});
 }
 
 TYPED_TEST(FrameRenderer, BrokenMeshes) {
@@ -360,6 +363,34 @@ TYPED_TEST(FrameRenderer, IdentityIsTheSourceAtHalfPixels) {
   EXPECT_NEAR(out.row(10)[20].red, unit * 4 * 19.5,
               std::max(1e-5, depth<TypeParam>::full > 1 ? 1. : 0));
   EXPECT_FALSE(renderFrame<TypeParam>(clip, nullptr, settings, R, 1, frames, operations, out));
+}
+
+// Each kernel that this processor runs, to the bit: rows of many vectors and rests of all lengths,
+// opaque stretches and edges of alpha.
+TYPED_TEST(FrameRenderer, InstructionSetNeverShows) {
+  for (const alphas a : {alphas::full, alphas::edges}) {
+    Clip clip(403, 57, 9, 4, turned);
+    Renderer R = MakeRenderer(clip, 1, 1);
+    OneFrame<TypeParam> frames(textured<TypeParam>(403, 57, a));
+    PlainOperations<TypeParam> operations;
+    RenderSettings settings;
+    settings.framing = Framing::stabilize_only;
+    std::vector<unsigned char> first;
+    const std::int64_t supported = hwy::SupportedTargets() & HWY_TARGETS;
+    for (std::int64_t left = supported; left != 0; left &= left - 1) {
+      SCOPED_TRACE(hwy::TargetName(left & -left));
+      hwy::SetSupportedTargetsForTest(left & -left);
+      hwy::GetChosenTarget().Update(left & -left);
+      WorldX<TypeParam> out(R.planeWidth, R.planeHeight);
+      renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, operations, out);
+      const auto* bytes = reinterpret_cast<const unsigned char*>(out.data());
+      const std::vector<unsigned char> drawn(bytes, bytes + out.row_bytes() * out.height());
+      if (first.empty()) first = drawn;
+      EXPECT_TRUE(drawn == first);
+    }
+    hwy::SetSupportedTargetsForTest(0);
+    hwy::GetChosenTarget().Update(hwy::SupportedTargets());
+  }
 }
 
 TYPED_TEST(FrameRenderer, ThreadCountNeverShows) {
