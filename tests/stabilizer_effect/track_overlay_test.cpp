@@ -1,6 +1,5 @@
 #include <gtest/gtest.h>
 
-#include "platform/tessel/debug.h"
 #include "tests/stabilizer_effect/stabilizer_host.h"
 
 namespace kelp::effect {
@@ -8,13 +7,6 @@ namespace {
 
 constexpr int kWidth = 64, kHeight = 48;
 constexpr double kDot = 3.14 * 5.3 * 5.3;  // pixels that a dot touches
-
-class ExperimentalParameters : public ::testing::Environment {
-  void SetUp() override {
-    tessel::debug::DebugDatabase::Set("ShowExperimentalEffectParameters", 1);
-  }
-};
-const auto* const environment = ::testing::AddGlobalTestEnvironment(new ExperimentalParameters);
 
 // A solved clip of two frames whose one track is at (20, 20) and (24, 23), shown with its tracks.
 class TrackOverlayTest : public ::testing::Test {
