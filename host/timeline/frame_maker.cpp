@@ -25,7 +25,8 @@ PicturePtr FrameMaker::Get(const FrameRequest& request, const FrameLayout& layou
   if (place) {
     const boost::shared_ptr<Making> making = place;
     made_.wait(lock, [&] { return making->done; });
-    return making->picture;
+    // It may have left the cache already, before a reference came that is to keep it.
+    return making->picture ? cache_.Insert(identifier, making->picture) : nullptr;
   }
   const boost::shared_ptr<Making> making = place = boost::make_shared<Making>();
   lock.unlock();
