@@ -84,7 +84,9 @@ void RenderQueue::Run() {
     } else if (closed_) {
       return;
     } else if (next != cancelled_.end()) {
-      changed_.wait_until(lock, next->first);
+      // A copy: the wait reads it again at its end, when another thread may have taken the entry.
+      const Clock::time_point due = next->first;
+      changed_.wait_until(lock, due);
     } else {
       changed_.wait(lock);
     }
