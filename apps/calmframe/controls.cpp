@@ -4,6 +4,7 @@
 #include <cctype>
 #include <cmath>
 #include <cstdlib>
+#include <iterator>
 #include <sstream>
 #include <utility>
 
@@ -187,6 +188,14 @@ void AddControlFlags(CLI::App& command, ControlFlags& flags) {
       ->group("Controls");
   command.add_flag("--experimental", flags.experimental, "Offer the experimental parameters too")
       ->group("Controls");
+}
+
+bool HasFlag(std::int32_t disk_id) {
+  constexpr std::int32_t kFlagged[] = {
+      kActionSafeMargin, kMaximumScale,         kAdditionalScale,    kResult, kSmoothness,
+      kFraming,          kCropLessSmoothMore,   kHideWarningBanner,  kMethod, kSynthesisEdgeFeather,
+      kDetailedAnalysis, kRollingShutterRipple, kSynthesisInputRange};
+  return std::find(std::begin(kFlagged), std::end(kFlagged), disk_id) != std::end(kFlagged);
 }
 
 void ShowExperimentalParameters(const ControlFlags& flags) {

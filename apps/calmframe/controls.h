@@ -20,6 +20,9 @@ struct ControlFlags {
 // Adds a flag for each of the user's controls, by the control's name, --param and --experimental.
 void AddControlFlags(CLI::App& command, ControlFlags& flags);
 
+// Whether a parameter has a flag of its own.
+bool HasFlag(std::int32_t disk_id);
+
 // To be called before the effect is loaded: whether it declares its experimental parameters is
 // settled then.
 void ShowExperimentalParameters(const ControlFlags& flags);

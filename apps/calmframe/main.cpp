@@ -14,6 +14,7 @@
 #include "apps/calmframe/params_command.h"
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/project_commands.h"
+#include "apps/calmframe/report_command.h"
 #include "apps/calmframe/stabilize_command.h"
 #include "host/media/clip.h"
 
@@ -73,6 +74,7 @@ int Run(int argc, char** argv) {
   RenderCommand render(program);
   InfoCommand info(program);
   TracksCommand tracks(program);
+  ReportCommand report(program);
   try {
     program.parse(argc, argv);
   } catch (const CLI::Success& success) {
@@ -81,7 +83,8 @@ int Run(int argc, char** argv) {
     return FailUsage(program, error, argc, argv);
   }
 
-  const bool json = stabilize.json() || demo.json() || analyze.json() || render.json();
+  const bool json =
+      stabilize.json() || demo.json() || analyze.json() || render.json() || report.json();
   CatchInterrupts();
   try {
     if (stabilize.chosen()) stabilize.Run();
@@ -91,6 +94,7 @@ int Run(int argc, char** argv) {
     if (render.chosen()) render.Run();
     if (info.chosen()) info.Run();
     if (tracks.chosen()) tracks.Run();
+    if (report.chosen()) report.Run();
     return kDone;
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);

@@ -35,4 +35,25 @@ std::string NumberText(double number) {
   return text;
 }
 
+double DefaultOf(const HX_ParamDef& param) {
+  switch (param.kind) {
+    case HX_PARAM_FLOAT_SLIDER:
+      return double{param.u.fs.default_value};
+    case HX_PARAM_POPUP:
+      return param.u.pd.default_value;
+    default:
+      return param.u.bd.default_value;
+  }
+}
+
+std::string ValueText(const HX_ParamDef& param, double value) {
+  if (param.kind == HX_PARAM_CHECKBOX) return value != 0 ? "on" : "off";
+  if (param.kind == HX_PARAM_POPUP) {
+    const std::vector<std::string> items = PopupItems(param);
+    const auto index = static_cast<std::size_t>(value) - 1;
+    if (index < items.size()) return items[index];
+  }
+  return NumberText(value);
+}
+
 }  // namespace calmframe

@@ -18,4 +18,10 @@ std::vector<std::string> PopupItems(const HX_ParamDef& param);
 // As short as it can be for six digits.
 std::string NumberText(double number);
 
+// Of one that has a value.
+double DefaultOf(const HX_ParamDef& param);
+
+// A value as --param takes it.
+std::string ValueText(const HX_ParamDef& param, double value);
+
 }  // namespace calmframe

@@ -15,28 +15,6 @@
 namespace calmframe {
 namespace {
 
-double DefaultOf(const HX_ParamDef& param) {
-  switch (param.kind) {
-    case HX_PARAM_FLOAT_SLIDER:
-      return double{param.u.fs.default_value};
-    case HX_PARAM_POPUP:
-      return param.u.pd.default_value;
-    default:
-      return param.u.bd.default_value;
-  }
-}
-
-// A value as --param takes it.
-std::string ValueText(const HX_ParamDef& param, double value) {
-  if (param.kind == HX_PARAM_CHECKBOX) return value != 0 ? "on" : "off";
-  if (param.kind == HX_PARAM_POPUP) {
-    const std::vector<std::string> items = PopupItems(param);
-    const auto index = static_cast<std::size_t>(value) - 1;
-    if (index < items.size()) return items[index];
-  }
-  return NumberText(value);
-}
-
 std::string RangeText(const HX_ParamDef& param) {
   if (param.kind == HX_PARAM_CHECKBOX) return "on, off";
   if (param.kind == HX_PARAM_FLOAT_SLIDER) {

@@ -4,25 +4,17 @@
 #include <filesystem>
 #include <memory>
 #include <nlohmann/json.hpp>
-#include <optional>
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/steady_clip.h"
+#include "apps/calmframe/track_export.h"
 #include "host/project/project_file.h"
 #include "platform/tessel/threads.h"
-#include "platform/tesselui/save_dialog.h"
 
 namespace calmframe {
 namespace {
-
-constexpr std::int32_t kSaveTracksButton = 290;  // disk id
-
-std::unique_ptr<SteadyClip> Open(const std::string& path, const ControlFlags& controls = {}) {
-  const host::Project project = host::LoadProject(path);
-  return std::make_unique<SteadyClip>(project, host::FindClip(path, project), controls);
-}
 
 // The clip as a writer of a part sees it: its other streams belong to the whole.
 media::ClipInfo PartOf(const media::ClipInfo& info, const FrameRange& range) {
@@ -54,7 +46,7 @@ RenderCommand::RenderCommand(CLI::App& program)
 void RenderCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
-  const std::unique_ptr<SteadyClip> clip = Open(project_);
+  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_);
   const media::ClipInfo& info = clip->info();
   const FrameRange range{from_, to_ == 0 ? info.frame_count : to_};
   if (range.first >= range.end || range.end > info.frame_count) {
@@ -65,7 +57,7 @@ void RenderCommand::Run() {
       output_, PartOf(info, range), info.width, info.height, flags_.encode);
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   CheckCrop(*clip, progress);
-  RenderClip(*clip, range, flags_.depth, run_.threads, *writer, progress);
+  RenderClip(*clip, range, {.depth = flags_.depth, .threads = run_.threads}, *writer, progress);
   writer->Finish();
   for (const std::string& line : writer->warnings()) progress.Warn(line);
   unsaved.Throw();
@@ -117,21 +109,12 @@ TracksCommand::TracksCommand(CLI::App& program)
 void TracksCommand::Run() {
   ControlFlags controls;
   controls.experimental = true;  // the button is one for experts
-  const std::unique_ptr<SteadyClip> clip = Open(project_, controls);
+  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_, controls);
   std::error_code error;
   if (std::filesystem::exists(output_, error)) {
     throw media::Failure(media::Failure::Side::output, output_ + ": exists already");
   }
-  tesselui::InstallSaveDialog(
-      [this](const tesselui::SaveDialogRequest&) -> std::optional<std::string> { return output_; });
-  const host::CommandResult pressed =
-      clip->effect().Press(clip->effect().IndexOf(kSaveTracksButton));
-  tesselui::InstallSaveDialog({});
-  if (!pressed.ok()) throw SolveFailure(pressed.Line(output_));
-  if (!std::filesystem::exists(output_, error)) {
-    throw media::Failure(media::Failure::Side::output,
-                         output_ + ": not written; " + project_ + " may hold no tracks");
-  }
+  SaveTracks(*clip, project_, output_);
 }
 
 }  // namespace calmframe

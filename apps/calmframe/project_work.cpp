@@ -28,6 +28,11 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
   return std::make_unique<SteadyClip>(saved, clip, controls);
 }
 
+std::unique_ptr<SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
+  const host::Project project = host::LoadProject(path);
+  return std::make_unique<SteadyClip>(project, host::FindClip(path, project), controls);
+}
+
 void Unsaved::Throw() const {
   if (!line_.empty()) throw media::Failure(media::Failure::Side::output, line_);
 }

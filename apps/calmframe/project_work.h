@@ -18,6 +18,11 @@ void AddProjectFlag(CLI::App& command, std::string& project);
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
                                    const ControlFlags& controls);
 
+// The clip of saved work, found by its name or beside it. Throws media::Failure,
+// host::ProjectFailure.
+std::unique_ptr<SteadyClip> OpenSaved(const std::string& project,
+                                      const ControlFlags& controls = {});
+
 // A save that failed: the work is done all the same, and whoever asked for it gets its result
 // first.
 class Unsaved {

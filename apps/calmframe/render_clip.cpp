@@ -33,13 +33,14 @@ void CopyField(const host::WorldBuffer& from, int parity, host::WorldBuffer& to)
 
 // A frame as it is to be written. The fields of an interlaced one were shot one after the other, so
 // each is rendered for its own instant and gives its lines.
-FramePixels RenderFrame(host::Renderer& renderer, std::int64_t frame, int depth,
-                        media::FieldOrder order) {
+FramePixels RenderFrame(host::Renderer& renderer, std::int64_t frame,
+                        const RenderSettings& settings, media::FieldOrder order) {
   const auto render = [&](bool second_field) {
     host::RenderRequest request;
     request.frame = frame;
     request.second_field = second_field;
-    request.bit_depth = depth;
+    request.bit_depth = settings.depth;
+    request.downsample = {1, static_cast<std::uint32_t>(settings.downsample)};
     const host::RenderedFrame rendered = renderer.Planned(request);
     if (!rendered.result.ok()) {
       throw SolveFailure(rendered.result.Line("frame " + std::to_string(frame)));
@@ -57,14 +58,14 @@ FramePixels RenderFrame(host::Renderer& renderer, std::int64_t frame, int depth,
 // the effect.
 class RenderAhead {
  public:
-  RenderAhead(SteadyClip& clip, const FrameRange& range, int depth, int threads)
+  RenderAhead(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings)
       : clip_(clip),
-        depth_(depth),
+        settings_(settings),
         end_(static_cast<std::int64_t>(range.end)),
-        window_(threads + 2),
+        window_(settings.threads + 2),
         next_(static_cast<std::int64_t>(range.first)),
         taken_(next_) {
-    for (int i = 0; i < threads; ++i) threads_.emplace_back([this] { RenderFrames(); });
+    for (int i = 0; i < settings.threads; ++i) threads_.emplace_back([this] { RenderFrames(); });
   }
   ~RenderAhead() {
     {
@@ -99,7 +100,7 @@ class RenderAhead {
         if (stopped_ || failure_ || next_ >= end_) return;
         const std::int64_t frame = next_++;
         lock.unlock();
-        FramePixels pixels = RenderFrame(*renderer, frame, depth_, clip_.info().field_order);
+        FramePixels pixels = RenderFrame(*renderer, frame, settings_, clip_.info().field_order);
         lock.lock();
         done_[frame] = std::move(pixels);
         changed_.notify_all();
@@ -112,7 +113,7 @@ class RenderAhead {
   }
 
   SteadyClip& clip_;
-  const int depth_;
+  const RenderSettings settings_;
   const std::int64_t end_;
   const std::int64_t window_;  // frames that may be ahead of the one wanted
   std::mutex mutex_;           // guards all below but the threads
@@ -164,25 +165,37 @@ void MakeRoomForNeighbours(SteadyClip& clip, int depth, int threads) {
 
 }  // namespace
 
-void RenderClip(SteadyClip& clip, const FrameRange& range, int depth, int threads,
-                media::ClipWriter& writer, ProgressLine& progress) {
-  const media::ClipInfo& info = clip.info();
-  if (depth == 0) depth = info.bit_depth > 8 ? 16 : 8;
-  if (threads == 0) threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
+void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+                  const std::string& stage, ProgressLine& progress,
+                  const std::function<void(std::size_t, const host::WorldBuffer&)>& take) {
+  RenderSettings own = settings;
+  if (own.depth == 0) own.depth = clip.info().bit_depth > 8 ? 16 : 8;
+  if (own.threads == 0) {
+    own.threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
+  }
   constexpr int kMostInWork = 8;  // each holds some frames; the strips of one use all processors
-  MakeRoomForNeighbours(clip, depth, threads);
-  RenderAhead frames(clip, range, depth, std::min(threads, kMostInWork));
-  Progress shown{"rendering", 0, static_cast<double>(range.end - range.first), "frames", "", false};
+  own.threads = std::min(own.threads, kMostInWork);
+  MakeRoomForNeighbours(clip, own.depth, own.threads);
+  RenderAhead frames(clip, range, own);
+  Progress shown{stage, 0, static_cast<double>(range.end - range.first), "frames", "", false};
   for (std::size_t frame = range.first; frame < range.end; ++frame) {
     if (InterruptAsked()) throw Interrupted();
     shown.done = static_cast<double>(frame - range.first);
     progress.Show(shown);
-    Write(writer, frame - range.first, *frames.Take(static_cast<std::int64_t>(frame)));
+    take(frame, *frames.Take(static_cast<std::int64_t>(frame)));
   }
   clip.CheckMedia();
   shown.done = shown.total;
   shown.ends = true;
   progress.Show(shown);
+}
+
+void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+                media::ClipWriter& writer, ProgressLine& progress) {
+  RenderFrames(clip, range, settings, "rendering", progress,
+               [&](std::size_t frame, const host::WorldBuffer& pixels) {
+                 Write(writer, frame - range.first, pixels);
+               });
 }
 
 }  // namespace calmframe

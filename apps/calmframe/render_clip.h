@@ -1,8 +1,13 @@
 #pragma once
 
+#include <cstddef>
+#include <functional>
+#include <string>
+
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/steady_clip.h"
 #include "host/media/clip.h"
+#include "host/pixels/world_buffer.h"
 
 namespace calmframe {
 
@@ -11,11 +16,24 @@ struct FrameRange {
   std::size_t first = 0, end = 0;
 };
 
-// Renders a solved clip's frames, several at a time, and hands them to the writer in order, counted
-// from the range's first. depth: 8, 16 or 32 (float) bits of a component, 0 the least that holds
-// the source. threads: frames in work at once, 0 as many as there are processors. Throws
-// Interrupted, SolveFailure, media::Failure.
-void RenderClip(SteadyClip& clip, const FrameRange& range, int depth, int threads,
+// depth: 8, 16 or 32 (float) bits of a component, 0 the least that holds the source. downsample: a
+// side is drawn with one pixel in so many. threads: frames in work at once, 0 as many as there are
+// processors.
+struct RenderSettings {
+  int depth = 0;
+  int downsample = 1;
+  int threads = 0;
+};
+
+// Renders a solved clip's frames, several at a time, and gives them out in order, with their number
+// in the clip. `stage`: what the progress is called. Throws Interrupted, SolveFailure,
+// media::Failure, and what `take` throws.
+void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+                  const std::string& stage, ProgressLine& progress,
+                  const std::function<void(std::size_t, const host::WorldBuffer&)>& take);
+
+// The same into a file: frames are counted from the range's first.
+void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
                 media::ClipWriter& writer, ProgressLine& progress);
 
 }  // namespace calmframe

@@ -72,7 +72,8 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
       media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
   const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
   CheckCrop(*clip, progress);
-  RenderClip(*clip, {0, info.frame_count}, flags.depth, threads, *writer, progress);
+  RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
+             progress);
   writer->Finish();
   for (const std::string& line : writer->warnings()) progress.Warn(line);
   unsaved.Throw();

@@ -5,10 +5,12 @@
 #include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstdio>
+#include <optional>
 #include <utility>
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/plugin_path.h"
+#include "host/effects/param_table.h"
 
 namespace calmframe {
 namespace {
@@ -17,6 +19,7 @@ namespace {
 constexpr std::int32_t kAnalyzeButton = 1;
 constexpr std::int32_t kCancelButton = 11;
 constexpr std::int32_t kStabilizationGroup = 12;
+constexpr std::int32_t kMethod = 28;
 
 // The effect's words for what its status counter tells when it has ended without a result.
 enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
@@ -158,12 +161,32 @@ Reuse SteadyClip::Work(ProgressLine& progress) {
   }
   reuse.solve = reuse.analysis && warp && warp == FirstWarp();
   reuse.framing = reuse.framing && reuse.solve;
+  CheckResult(progress);
+  return reuse;
+}
+
+void SteadyClip::CheckResult(ProgressLine& progress) {
   CheckMedia();
   const std::vector<std::string> messages = effect_->TakeMessages();
   const int status = host::Session::StatusOf(*effect_);
   if (status != kReady) throw SolveFailure(FailureText(status, messages));
   for (const std::string& message : messages) progress.Warn(message);
-  return reuse;
+}
+
+bool SteadyClip::SolveAnew(ProgressLine& progress) {
+  const std::int32_t method = effect_->IndexOf(kMethod);
+  const auto param = effect_->Param(method);
+  const std::optional<double> value = param ? host::ValueOf(*param) : std::nullopt;
+  if (!value) return false;
+  // A method that is quick to solve for; with the first one again, nothing of it stands.
+  Reuse reuse{true, true, true};
+  for (const double other : {*value == 1 ? 2.0 : 1.0, *value}) {
+    effect_->SetParam(method, other);
+    reuse = {true, true, true};
+    Settle(progress, reuse);
+    CheckResult(progress);
+  }
+  return !reuse.framing;
 }
 
 host::Project SteadyClip::Saved() {

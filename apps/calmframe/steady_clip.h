@@ -45,6 +45,10 @@ class SteadyClip {
   // Interrupted, SolveFailure, media::Failure.
   Reuse Work(ProgressLine& progress);
 
+  // Solves once more with the controls as they stand, for what only a running solve tells; false
+  // where nothing began to solve. Throws as Work.
+  bool SolveAnew(ProgressLine& progress);
+
   // Throws SolveFailure where the effect can't be saved.
   host::Project Saved();
 
@@ -60,6 +64,8 @@ class SteadyClip {
   SteadyClip(const host::Project* project, const std::string& path, const ControlFlags& controls);
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`.
   void Settle(ProgressLine& progress, Reuse& reuse);
+  // Throws SolveFailure where the effect is not ready.
+  void CheckResult(ProgressLine& progress);
   // Address of the first frame's warp, which goes with its solve; null without one.
   const void* FirstWarp();
 

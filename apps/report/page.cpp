@@ -1,0 +1,178 @@
+#include "apps/report/page.h"
+
+#include <cmath>
+#include <nlohmann/json.hpp>
+
+namespace calmframe::report {
+namespace {
+
+constexpr char kHead[] = R"html(<meta name="viewport" content="width=device-width, initial-scale=1">
+<meta http-equiv="Content-Security-Policy" content="default-src 'none'; img-src data:; style-src 'unsafe-inline'; script-src 'unsafe-inline'">
+<link rel="icon" href="data:,">
+<style>
+:root { color-scheme: light dark; --ink: #1c2024; --soft: #5f6b76; --line: #dfe4e8; --card: #fff; --back: #f5f6f8; --c0: #d55e00; --c1: #0072b2; --c2: #009e73; }
+@media (prefers-color-scheme: dark) { :root { --ink: #e8eaed; --soft: #9aa5b1; --line: #363c43; --card: #1e2226; --back: #14171a; --c0: #f0a35e; --c1: #5ab4f0; --c2: #3fcf9f; } }
+* { box-sizing: border-box; }
+body { margin: 0 auto; max-width: 1080px; padding: 24px 20px 60px; background: var(--back); color: var(--ink); font: 15px/1.5 system-ui, "Segoe UI", "Noto Sans", "DejaVu Sans", sans-serif; }
+h1 { font-size: 26px; line-height: 1.25; margin: 8px 0 2px; overflow-wrap: anywhere; }
+h2 { font-size: 17px; margin: 34px 0 10px; }
+.lead, figcaption p { color: var(--soft); margin: 0; }
+section.cards { display: grid; grid-template-columns: repeat(auto-fit, minmax(min(320px, 100%), 1fr)); gap: 14px; margin-top: 18px; align-items: start; }
+table { width: 100%; border-collapse: collapse; background: var(--card); border: 1px solid var(--line); border-radius: 8px; }
+caption { text-align: left; font-weight: 600; padding: 0 0 6px; }
+th, td { text-align: left; vertical-align: top; padding: 5px 12px; border-top: 1px solid var(--line); overflow-wrap: anywhere; }
+tr:first-child > * { border-top: 0; }
+th { font-weight: 400; color: var(--soft); width: 46%; }
+td { font-variant-numeric: tabular-nums; }
+.notes { background: var(--card); border: 1px solid var(--line); border-left: 4px solid var(--c0); border-radius: 6px; padding: 8px 14px; margin: 18px 0 0; list-style: none; }
+figure { margin: 0 0 16px; background: var(--card); border: 1px solid var(--line); border-radius: 8px; padding: 12px 14px 8px; break-inside: avoid; }
+figcaption { display: flex; flex-wrap: wrap; gap: 2px 16px; align-items: baseline; font-size: 13.5px; margin-bottom: 6px; }
+figcaption b { font-size: 15px; }
+figcaption p { flex-basis: 100%; }
+.key { white-space: nowrap; }
+.key i { display: inline-block; width: 18px; height: 0; border-top: 3px solid; vertical-align: middle; margin-right: 6px; }
+.key output { font-variant-numeric: tabular-nums; margin-left: 6px; color: var(--ink); }
+.k0 { color: var(--c0); } .k1 { color: var(--c1); } .k2 { color: var(--c2); }
+.k0 i { border-top-style: dashed; }
+svg.plot { display: block; width: 100%; height: auto; touch-action: pan-y; }
+svg text { font-size: 11px; fill: var(--soft); }
+svg .y { text-anchor: end; dominant-baseline: middle; }
+svg .x { text-anchor: middle; }
+svg .grid, svg .tick { stroke: var(--line); }
+svg .curve { fill: none; stroke-linejoin: round; stroke-linecap: round; stroke-width: 1.4; vector-effect: non-scaling-stroke; }
+svg .c0 { stroke: var(--c0); stroke-dasharray: 4 2.5; } svg .c1 { stroke: var(--c1); stroke-width: 2.2; } svg .c2 { stroke: var(--c2); }
+svg .alone { stroke-dasharray: none; stroke: var(--c1); stroke-width: 1.8; }
+svg .cursor { stroke: var(--soft); display: none; }
+.film { display: grid; grid-template-columns: repeat(auto-fill, minmax(min(300px, 46%), 1fr)); gap: 14px; }
+.film figure { padding: 8px; margin: 0; }
+.film img { display: block; width: 100%; height: auto; border-radius: 4px; background: #000; margin-top: 4px; }
+.film figcaption { margin: 0; color: var(--soft); }
+footer { color: var(--soft); font-size: 13px; margin-top: 40px; }
+@media print { :root { color-scheme: light; --back: #fff; } body { max-width: none; padding: 0; } }
+</style>
+)html";
+
+constexpr char kScript[] = R"html(<script>
+"use strict";
+const data = JSON.parse(document.getElementById("data").textContent);
+const plots = [...document.querySelectorAll("svg.plot")];
+function show(index) {
+  for (const svg of plots) {
+    const count = +svg.dataset.count, cursor = svg.querySelector(".cursor");
+    const i = Math.max(0, Math.min(count - 1, index)), x = 56 + i * (720 - 56 - 12) / (count - 1);
+    cursor.setAttribute("x1", x);
+    cursor.setAttribute("x2", x);
+    cursor.style.display = "inline";
+    const curves = Object.values(data.plots[svg.id].curves);
+    svg.closest("figure").querySelectorAll("output").forEach((output, c) => {
+      const value = curves[c][i];
+      output.textContent = value == null ? "–" : value + " " + data.plots[svg.id].unit;
+    });
+  }
+  document.getElementById("moment").textContent = (index * data.seconds_a_value).toFixed(2) + " s";
+}
+let last = 0;
+for (const svg of plots) {
+  svg.tabIndex = 0;
+  svg.addEventListener("pointermove", event => {
+    const box = svg.getBoundingClientRect(), x = (event.clientX - box.left) / box.width * 720;
+    last = Math.round((x - 56) / (720 - 56 - 12) * (svg.dataset.count - 1));
+    show(last = Math.max(0, Math.min(svg.dataset.count - 1, last)));
+  });
+  svg.addEventListener("keydown", event => {
+    const step = { ArrowLeft: -1, ArrowRight: 1 }[event.key];
+    if (step) show(last = Math.max(0, Math.min(svg.dataset.count - 1, last + step)));
+  });
+}
+</script>
+)html";
+
+std::string TableOf(const std::string& caption, const std::vector<Fact>& facts) {
+  std::string html = "<table><caption>" + Escaped(caption) + "</caption>\n";
+  for (const Fact& fact : facts) {
+    html += "<tr><th scope=\"row\">" + Escaped(fact.name) + "</th><td>" + Escaped(fact.value) +
+            "</td></tr>\n";
+  }
+  return html + "</table>\n";
+}
+
+// A curve that stands alone has the second one's colour and no key.
+std::string FigureOf(const Plot& plot, double seconds_a_value) {
+  std::string html = "<figure><figcaption><b>" + Escaped(plot.title) + "</b>";
+  const bool alone = plot.curves.size() == 1;
+  for (std::size_t c = 0; c < plot.curves.size(); ++c) {
+    html += "<span class=\"key k" + std::to_string(alone ? 1 : c) + "\"><i></i>" +
+            Escaped(plot.curves[c].name) + "<output></output></span>";
+  }
+  html += "<p>" + Escaped(plot.about) + "</p></figcaption>\n";
+  return html + SvgOf(plot, seconds_a_value) + "</figure>\n";
+}
+
+double Rounded(double value) {
+  return std::round(value * 1000) / 1000;
+}
+
+std::string DataOf(const Page& page) {
+  nlohmann::ordered_json json;
+  json["seconds_a_value"] = page.seconds_a_value;
+  json["plots"] = nlohmann::ordered_json::object();
+  for (const Plot& plot : page.plots) {
+    auto& entry = json["plots"][plot.id];
+    entry["unit"] = plot.unit;
+    entry["curves"] = nlohmann::ordered_json::object();
+    for (const Curve& curve : plot.curves) {
+      auto& values = entry["curves"][curve.name] = nlohmann::ordered_json::array();
+      for (const double value : curve.values) {
+        if (std::isfinite(value)) {
+          values.push_back(Rounded(value));
+        } else {
+          values.push_back(nullptr);
+        }
+      }
+    }
+  }
+  std::string text = json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
+  // Nothing in it may end the element.
+  for (std::size_t at = 0; (at = text.find('<', at)) != std::string::npos;) {
+    text.replace(at, 1, "\\u003c");
+  }
+  return text;
+}
+
+}  // namespace
+
+std::string HtmlOf(const Page& page) {
+  std::string html =
+      "<!DOCTYPE html>\n<html lang=\"en\">\n<head>\n<meta charset=\"utf-8\">\n<title>" +
+      Escaped(page.title) + ", steadied</title>\n" + kHead + "</head>\n<body>\n<h1>" +
+      Escaped(page.title) + "</h1>\n<p class=\"lead\">What Calmframe made of it</p>\n";
+  if (!page.notes.empty()) {
+    html += "<ul class=\"notes\">\n";
+    for (const std::string& note : page.notes) html += "<li>" + Escaped(note) + "</li>\n";
+    html += "</ul>\n";
+  }
+  html += "<section class=\"cards\">\n" + TableOf("In figures", page.facts) +
+          TableOf("Controls", page.controls) + "</section>\n";
+  if (!page.film.empty()) {
+    html += "<h2>Before and after</h2>\n<section class=\"film\">\n";
+    for (const FilmFrame& moment : page.film) {
+      const std::string when = "frame " + std::to_string(moment.frame);
+      html += "<figure><figcaption>" + when + ", " + Short(moment.seconds, 2) + " s</figcaption>";
+      if (!moment.before.empty()) {
+        html += "<img alt=\"" + when + " before\" src=\"" + moment.before + "\">";
+      }
+      if (!moment.after.empty()) {
+        html += "<img alt=\"" + when + " after\" src=\"" + moment.after + "\">";
+      }
+      html += "</figure>\n";
+    }
+    html += "</section>\n";
+  }
+  if (!page.plots.empty()) html += "<h2>Over time <output id=\"moment\"></output></h2>\n";
+  for (const Plot& plot : page.plots) html += FigureOf(plot, page.seconds_a_value);
+  html += "<script type=\"application/json\" id=\"data\">" + DataOf(page) + "</script>\n";
+  if (!page.plots.empty()) html += kScript;
+  return html + "<footer>Made by <code>calmframe report</code></footer>\n</body>\n</html>\n";
+}
+
+}  // namespace calmframe::report

@@ -1,0 +1,22 @@
+#pragma once
+
+#include <cstddef>
+#include <string>
+
+#include "platform/hx/hx_pixel.h"
+
+namespace calmframe::report {
+
+// 8-bit pixels, top row first, straight alpha; pixel_aspect: width : height of one.
+struct PictureView {
+  const HX_Pixel8* pixels = nullptr;
+  std::ptrdiff_t row_bytes = 0;
+  int width = 0, height = 0;
+  double pixel_aspect = 1;
+};
+
+// A PNG of `width` square pixels across, each the mean of what it covers, as a data URL. Throws
+// std::bad_alloc.
+std::string DataUrlOf(const PictureView& picture, int width);
+
+}  // namespace calmframe::report
