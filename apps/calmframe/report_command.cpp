@@ -204,8 +204,9 @@ void AddSolve(const SolvedClip& solved, const std::vector<double>& scores, repor
   }
 }
 
-// Draws the whole clip, small: what is left empty, and the filmstrip.
-void AddPictures(SteadyClip& clip, int threads, ProgressLine& progress, report::Page& page) {
+// Draws the whole clip, small: the filmstrip, and how much of each frame is left empty, percent.
+std::vector<double> AddPictures(SteadyClip& clip, int threads, ProgressLine& progress,
+                                report::Page& page) {
   const media::ClipInfo& info = clip.info();
   const double aspect =
       static_cast<double>(info.pixel_aspect.num) / static_cast<double>(info.pixel_aspect.den);
@@ -234,23 +235,26 @@ void AddPictures(SteadyClip& clip, int threads, ProgressLine& progress, report::
     reader->Read(moment.frame, source.row<HX_Pixel8>(0), source.world().row_bytes);
     moment.before = DataUrlOf(ViewOf(source, aspect), kPictureWidth);
   }
+  return empty;
+}
+
+// One value for each row of the other curves, also where a frame has two fields.
+void AddEmptyShares(const std::vector<double>& empty, std::size_t rows, report::Page& page) {
   const double most = empty.empty() ? 0 : *std::max_element(empty.begin(), empty.end());
   page.facts.push_back({"Left empty", Percent(Mean(empty) / 100, 2) + " on the mean, " +
                                           Percent(most / 100, 2) + " at the most"});
-  Plot plot{"empty",
-            "Uncovered share",
-            "%",
-            "How much of the picture shows nothing, as it is drawn with these controls.",
-            {{"uncovered", {}}},
-            1,
-            true};
-  // One value for each row of the other curves, also where a frame has two fields.
-  const std::size_t rows =
-      page.plots.empty() ? empty.size() : page.plots[0].curves[0].values.size();
+  Curve curve{"uncovered", {}};
   for (std::size_t row = 0; row < rows; ++row) {
-    plot.curves[0].values.push_back(empty[row * empty.size() / rows]);
+    curve.values.push_back(empty[row * empty.size() / rows]);
   }
-  page.plots.push_back(std::move(plot));
+  page.plots.push_back(
+      {"empty",
+       "Uncovered share",
+       "%",
+       "How much of the picture shows nothing, as it is drawn with these controls.",
+       {curve},
+       1,
+       true});
 }
 
 std::string NameOf(const std::string& path) {
@@ -287,19 +291,20 @@ void ReportCommand::Run() {
                      report::Short(static_cast<double>(info.frame_count) / rate, 2) + " s"}};
   if (!info.warning.empty()) page.notes.push_back(info.warning);
 
-  std::string log;
   {
     const SolveLog solve_log;
-    // Saved work doesn't keep how the models were chosen: a solve of the same tells it again.
-    if (clip->Work(progress).solve) clip->SolveAnew(progress);
-    log = solve_log.text();
+    const bool saved = clip->Work(progress).solve;
+    page.controls = ControlsOf(*clip);
+    const SolvedClip solved = ReadSolve(*clip, project_);
+    const std::size_t rows = std::max<std::size_t>(solved.tracked.size(), 1);
+    page.seconds_a_value = static_cast<double>(info.frame_count) / rate / static_cast<double>(rows);
+    const std::vector<double> empty = AddPictures(*clip, run_.threads, progress, page);
+    // Saved work doesn't keep how the models were chosen: a solve of the same tells it again. It
+    // comes last, since tracks are saved in steps of 1/32 pixel, which moves its warps a little.
+    if (saved) clip->SolveAnew(progress);
+    AddSolve(solved, ScoresIn(solve_log.text(), rows), page);
+    AddEmptyShares(empty, rows, page);
   }
-  page.controls = ControlsOf(*clip);
-  const SolvedClip solved = ReadSolve(*clip, project_);
-  const std::size_t rows = std::max<std::size_t>(solved.tracked.size(), 1);
-  page.seconds_a_value = static_cast<double>(info.frame_count) / rate / static_cast<double>(rows);
-  AddSolve(solved, ScoresIn(log, rows), page);
-  AddPictures(*clip, run_.threads, progress, page);
 
   std::ofstream out(file.temporary(), std::ios::binary | std::ios::trunc);
   out << report::HtmlOf(page);

@@ -48,6 +48,7 @@ svg .cursor { stroke: var(--soft); display: none; }
 .film img { display: block; width: 100%; height: auto; border-radius: 4px; background: #000; margin-top: 4px; }
 .film figcaption { margin: 0; color: var(--soft); }
 footer { color: var(--soft); font-size: 13px; margin-top: 40px; }
+@media (max-width: 640px) { svg text { font-size: 19px; } }
 @media print { :root { color-scheme: light; --back: #fff; } body { max-width: none; padding: 0; } }
 </style>
 )html";
