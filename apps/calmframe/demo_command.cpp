@@ -8,6 +8,7 @@
 
 #include "apps/calmframe/caption.h"
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/flags.h"
 #include "host/media/clip.h"
 #include "synthetic/scene.h"
 
@@ -97,14 +98,24 @@ void WriteSideBySide(const std::string& left_path, const std::string& right_path
 
 DemoCommand::DemoCommand(CLI::App& program)
     : command_(program.add_subcommand(
-          "demo", "Make a shaky sample, steady it, and show both side by side")) {
-  command_->add_option("DIR", directory_, "Where the three clips go")->capture_default_str();
-  command_->add_option("--frames", frames_, "Length of the sample")
-      ->check(CLI::Range(2, 100000))
+          "demo",
+          "Make a shaky sample, steady it, and show both side by side\n\n"
+          "Draws a walk down a street of its own making and leaves shaky.mp4, steady.mp4 and "
+          "side-by-side.mp4 in DIR, over those of an earlier demo.")) {
+  command_->add_option("DIR", directory_, "Where the three clips go")
+      ->type_name("DIR")
       ->capture_default_str();
+  AddNumber<int>(
+      *command_, "--frames", [this](int frames) { frames_ = frames; }, "N", 2, 100000,
+      "Length of the sample, 30 frames a second")
+      ->default_str(std::to_string(frames_));
   AddControlFlags(*command_, controls_);
   AddOutputFlags(*command_, flags_);
   AddRunFlags(*command_, run_);
+  command_->footer(
+      "Examples:\n"
+      "  calmframe demo\n"
+      "  calmframe demo still --frames 60 --result no-motion");
 }
 
 void DemoCommand::Run() {

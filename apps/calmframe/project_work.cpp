@@ -2,16 +2,16 @@
 
 #include <filesystem>
 
+#include "apps/calmframe/flags.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
-  command
-      .add_option("--project", project,
-                  "Take up saved work from this file, if it is there, and save to it")
-      ->type_name("FILE")
-      ->group("Output");
+  AddFile(command, "--project", project,
+          "Take up saved work from this file where it is there, with its controls, and save to it; "
+          "what still stands of it is not done again")
+      ->group("Saved work");
 }
 
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,

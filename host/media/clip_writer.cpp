@@ -35,8 +35,9 @@ class FfmpegWriter final : public ClipWriter {
                                             : av_guess_format(nullptr, path.c_str(), nullptr);
     const std::string extension = std::filesystem::path(path).extension().string();
     if (!format || format->video_codec == AV_CODEC_ID_NONE || (format->flags & AVFMT_NOFILE)) {
-      Fail(extension.empty() ? "its name has no extension to tell the kind of file"
-                             : "no kind of video file ends in '" + extension + "'");
+      Fail((extension.empty() ? "its name has no extension to tell the kind of file"
+                              : "no kind of video file ends in '" + extension + "'") +
+           "; .mp4, .mov, .mkv and .webm are some");
     }
     if (!to_pipe_) file_.emplace(path, source.path, settings.overwrite);
     encoder_.emplace(shown_, *format, source, width, height, settings, warnings_);
