@@ -10,6 +10,7 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "host/media/clip.h"
+#include "platform/tessel/threads.h"
 #include "synthetic/scene.h"
 
 namespace calmframe {
@@ -41,7 +42,8 @@ synthetic::scene Street(int frames) {
 }
 
 void WriteSample(const std::string& path, int frames, const media::EncodeSettings& encode,
-                 ProgressLine& progress) {
+                 int threads, ProgressLine& progress) {
+  const tessel::threads::ProcessorLimit limit(threads);
   media::ClipInfo info;
   info.width = kWidth;
   info.height = kHeight;
@@ -49,15 +51,24 @@ void WriteSample(const std::string& path, int frames, const media::EncodeSetting
   info.frame_count = static_cast<std::size_t>(frames);
   const auto writer = media::ClipWriter::Create(path, info, kWidth, kHeight, encode);
   const synthetic::scene scene = Street(frames);
-  std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(kWidth) * kHeight);
+  constexpr int kAtOnce = 8;
+  constexpr std::size_t kPixels = std::size_t{kWidth} * kHeight;
   constexpr std::ptrdiff_t kRowBytes = kWidth * sizeof(HX_Pixel8);
+  std::vector<HX_Pixel8> pixels(kAtOnce * kPixels);
   Progress shown{"drawing", 0, static_cast<double>(frames), "frames", "", false};
-  for (int f = 0; f < frames; ++f) {
+  for (int first = 0; first < frames; first += kAtOnce) {
     if (InterruptAsked()) throw Interrupted();
-    shown.done = f;
+    shown.done = first;
     progress.Show(shown);
-    scene.render(f, pixels.data(), kWidth);
-    writer->Write(static_cast<std::size_t>(f), pixels.data(), kRowBytes);
+    const auto count = static_cast<std::size_t>(std::min(kAtOnce, frames - first));
+    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+        [&](std::size_t i) {
+          scene.render(first + static_cast<int>(i), &pixels[i * kPixels], kWidth);
+        },
+        count);
+    for (std::size_t i = 0; i < count; ++i) {
+      writer->Write(static_cast<std::size_t>(first) + i, &pixels[i * kPixels], kRowBytes);
+    }
   }
   writer->Finish();
   End(shown, progress);
@@ -132,7 +143,7 @@ void DemoCommand::Run() {
   OutputFlags flags = flags_;
   flags.encode = Encoding(flags_.encode);
 
-  WriteSample(shaky, frames_, flags.encode, progress);
+  WriteSample(shaky, frames_, flags.encode, run_.threads, progress);
   Stabilize(shaky, steady, "", controls_, flags, run_.threads, progress);
   WriteSideBySide(shaky, steady, both, flags.encode, progress);
   if (run_.progress_form() == ProgressLine::Form::line) {
