@@ -183,6 +183,8 @@ bool Encoder::Open(const AVCodec& codec, const AVOutputFormat& format, const Cli
     c.flags |= AV_CODEC_FLAG_QSCALE;
     c.global_quality = FF_QP2LAMBDA * std::clamp(settings.crf / 6, 1, 31);
   }
+  // It writes to the standard error past the library's log.
+  if (c.priv_data) av_opt_set(c.priv_data, "x265-params", "log-level=error", 0);
   error = avcodec_open2(&c, &codec, nullptr);
   return error >= 0;
 }

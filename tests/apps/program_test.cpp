@@ -150,11 +150,16 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
   }
   ExpectOneLine(Run("stabilize in.mp4 out.mp4 --codec libx624"), "did you mean libx264?");
   ExpectOneLine(Run("stabilize in.mp4 out.mp4 --pixel-format yuv420"), "did you mean yuv420p?");
+  ExpectOneLine(Run("stabilize in.mp4 no/such/folder.mp4"), "there is no folder no/such\n");
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "there.mp4"));
   std::ifstream kept(Path("there.mp4"));
   EXPECT_EQ(std::string(std::istreambuf_iterator<char>(kept), {}), "precious");
   EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet").code, 0);
   EXPECT_EQ(ClipReader::Open(Path("there.mp4"))->info().frame_count, 5u);
+  // An encoder that likes to talk, and the tag that players want.
+  EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet --codec hevc").text, "");
+  std::ifstream hevc(Path("there.mp4"));
+  EXPECT_THAT(std::string(std::istreambuf_iterator<char>(hevc), {}), HasSubstr("hvc1"));
 }
 
 TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
