@@ -157,7 +157,8 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
   EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet").code, 0);
   EXPECT_EQ(ClipReader::Open(Path("there.mp4"))->info().frame_count, 5u);
   // An encoder that likes to talk, and the tag that players want.
-  EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet --codec hevc").text, "");
+  EXPECT_THAT(Run("stabilize in.mp4 there.mp4 --overwrite --quiet --codec hevc").text,
+              ::testing::Not(HasSubstr("x265 [")));
   std::ifstream hevc(Path("there.mp4"));
   EXPECT_THAT(std::string(std::istreambuf_iterator<char>(hevc), {}), HasSubstr("hvc1"));
 }
