@@ -4,6 +4,7 @@
 #include <memory>
 #include <nlohmann/json.hpp>
 
+#include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/steady_clip.h"
 #include "platform/tessel/threads.h"
@@ -16,12 +17,19 @@ constexpr std::int32_t kAutoScaleGroup = 17;  // disk id; its name tells the sca
 }  // namespace
 
 AnalyzeCommand::AnalyzeCommand(CLI::App& program)
-    : command_(program.add_subcommand("analyze",
-                                      "Tell what would become of a clip, without rendering it")) {
-  command_->add_option("IN", input_, "The shaky clip")->required();
-  AddProjectFlag(*command_, project_);
+    : command_(program.add_subcommand(
+          "analyze",
+          "Tell what would become of a clip, without rendering it\n\n"
+          "Prints the crop window and how far it is enlarged. With --project, stabilize and render "
+          "go on from there.")) {
+  AddFile(*command_, "IN", input_, "The shaky clip")->required();
   AddControlFlags(*command_, controls_);
+  AddProjectFlag(*command_, project_);
   AddRunFlags(*command_, run_);
+  command_->footer(
+      "Examples:\n"
+      "  calmframe analyze shaky.mp4\n"
+      "  calmframe analyze shaky.mp4 --project shaky.calm --smoothness 20");
 }
 
 void AnalyzeCommand::Run() {

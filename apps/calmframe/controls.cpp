@@ -5,12 +5,12 @@
 #include <cmath>
 #include <cstdlib>
 #include <iterator>
-#include <sstream>
 #include <utility>
 
 #include "apps/calmframe/failures.h"
-#include "apps/calmframe/nearest_match.h"
+#include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
+#include "host/base/nearest_match.h"
 #include "platform/tessel/debug.h"
 
 namespace calmframe {
@@ -33,61 +33,39 @@ enum : std::int32_t {
   kSynthesisInputRange = 38
 };
 
-using Choices = std::vector<std::pair<std::string, double>>;
+constexpr char kControls[] = "Controls";
+constexpr char kFinerControls[] = "Finer controls";
 
-std::string NoneOf(const std::string& text, const std::vector<std::string>& names) {
-  const std::string nearest = NearestMatch(text, names);
-  std::string all;
-  for (const std::string& name : names) all += (all.empty() ? "" : ", ") + name;
-  return "'" + text + "' is none of " + all +
-         (nearest.empty() ? "" : "; did you mean " + nearest + "?");
-}
+struct Choice {
+  std::string name;
+  double value;
+  std::string meaning;  // goes on where the flag's description ends
+};
 
-// A flag that takes one of a few names; an unknown one is answered with the nearest.
-void AddChoice(CLI::App& command, ControlFlags& flags, const std::string& flag,
-               std::int32_t disk_id, const Choices& choices, const std::string& default_name,
-               const std::string& description) {
+// A popup; the choice that holds without the flag first.
+CLI::Option* AddPopup(CLI::App& command, ControlFlags& flags, const std::string& flag,
+                      std::int32_t disk_id, const std::vector<Choice>& choices,
+                      const std::string& description) {
   std::vector<std::string> names;
-  std::string shown;
-  for (const auto& choice : choices) {
-    names.push_back(choice.first);
-    shown += (shown.empty() ? "" : "|") + choice.first;
+  std::string meanings;
+  for (const Choice& choice : choices) {
+    meanings += (names.empty() ? ": " : "; ") + choice.name + " " + choice.meaning;
+    names.push_back(choice.name);
   }
-  const auto take = [flag, names, choices, disk_id, &flags](const std::string& text) {
-    for (const auto& [name, value] : choices) {
-      if (name == text) {
-        flags.values[disk_id] = value;
-        return;
-      }
+  const auto take = [choices, disk_id, &flags](const std::string& text) {
+    for (const Choice& choice : choices) {
+      if (choice.name == text) flags.values[disk_id] = choice.value;
     }
-    throw CLI::ValidationError(flag, NoneOf(text, names));
   };
-  command.add_option_function<std::string>(flag, take, description)
-      ->type_name(shown)
-      ->default_str(default_name)
-      ->group("Controls");
+  return AddChoice(command, flag, take, names, description + meanings)->default_str(names[0]);
 }
 
-void AddNumber(CLI::App& command, ControlFlags& flags, const std::string& flag,
-               std::int32_t disk_id, const std::string& unit, double least, double most,
-               double default_value, const std::string& description) {
-  // CLI::Range lets "nan" through.
-  const auto check = [least, most](const std::string& text) {
-    double number = 0;
-    const bool valid = CLI::detail::lexical_cast(text, number) && number >= least && number <= most;
-    std::ostringstream message;
-    if (!valid) message << text << " is not in the range " << least << " to " << most;
-    return message.str();
-  };
-  std::ostringstream shown;
-  shown << default_value;
-  command
-      .add_option_function<double>(
-          flag, [disk_id, &flags](double value) { flags.values[disk_id] = value; }, description)
-      ->check(check)
-      ->type_name(unit)
-      ->default_str(shown.str())
-      ->group("Controls");
+CLI::Option* AddSlider(CLI::App& command, ControlFlags& flags, const std::string& flag,
+                       std::int32_t disk_id, const std::string& unit, double least, double most,
+                       double default_value, const std::string& description) {
+  const auto take = [disk_id, &flags](double value) { flags.values[disk_id] = value; };
+  return AddNumber<double>(command, flag, take, unit, least, most, description)
+      ->default_str(NumberText(default_value));
 }
 
 void AddSwitch(CLI::App& command, ControlFlags& flags, const std::string& flag,
@@ -95,7 +73,7 @@ void AddSwitch(CLI::App& command, ControlFlags& flags, const std::string& flag,
   command
       .add_flag_callback(
           flag, [disk_id, &flags] { flags.values[disk_id] = 1; }, description)
-      ->group("Controls");
+      ->group(kFinerControls);
 }
 
 bool SameWord(const std::string& a, const std::string& b) {
@@ -129,7 +107,7 @@ double ParseValue(const HX_ParamDef& param, const std::string& text) {
     case HX_PARAM_FLOAT_SLIDER: {
       const auto least = double{param.u.fs.valid_min}, most = double{param.u.fs.valid_max};
       if (is_number && number >= least && number <= most) return number;
-      return refuse(text + " is not in the range " + NumberText(least) + " to " + NumberText(most));
+      return refuse(text + " is out of range: " + NumberText(least) + " to " + NumberText(most));
     }
     case HX_PARAM_CHECKBOX:
       if (SameWord(text, "on") || SameWord(text, "true") || text == "1") return 1;
@@ -152,42 +130,64 @@ double ParseValue(const HX_ParamDef& param, const std::string& text) {
 }  // namespace
 
 void AddControlFlags(CLI::App& command, ControlFlags& flags) {
-  AddChoice(command, flags, "--result", kResult, {{"smooth-motion", 1}, {"no-motion", 2}},
-            "smooth-motion", "Keep the camera's motion but smooth, or hold it still");
-  AddNumber(command, flags, "--smoothness", kSmoothness, "PERCENT", 0, 1000, 50,
-            "How much of the camera's motion is smoothed away");
-  AddChoice(
-      command, flags, "--method", kMethod,
-      {{"position", 1}, {"position-scale-rotation", 2}, {"perspective", 3}, {"subspace-warp", 4}},
-      "subspace-warp", "What may be done to a frame");
-  AddChoice(command, flags, "--framing", kFraming,
-            {{"stabilize-only", 1}, {"crop", 2}, {"crop-auto-scale", 3}, {"synthesize-edges", 4}},
-            "crop-auto-scale", "What becomes of the moving edges");
-  AddNumber(command, flags, "--maximum-scale", kMaximumScale, "PERCENT", 100, 10000, 150,
-            "Most that crop-auto-scale may enlarge");
-  AddNumber(command, flags, "--action-safe-margin", kActionSafeMargin, "PERCENT", 0, 100, 0,
-            "Border that crop-auto-scale need not fill");
-  AddNumber(command, flags, "--additional-scale", kAdditionalScale, "PERCENT", 0, 10000, 100,
-            "Scale applied on top");
+  AddSlider(command, flags, "--smoothness", kSmoothness, "PERCENT", 0, 1000, 50,
+            "How much of the camera's motion is smoothed away: more is calmer and crops more")
+      ->group(kControls);
+  AddPopup(command, flags, "--result", kResult,
+           {{"smooth-motion", 1, "keeps them but calms them"},
+            {"no-motion", 2, "holds the picture still as on a tripod"}},
+           "The camera's own moves")
+      ->group(kControls);
+  AddPopup(command, flags, "--framing", kFraming,
+           {{"crop-auto-scale", 3, "cuts them off and enlarges the rest to the full frame"},
+            {"crop", 2, "only cuts them off"},
+            {"stabilize-only", 1, "shows them"},
+            {"synthesize-edges", 4, "fills them from the frames before and after"}},
+           "The edges that the motion lays bare")
+      ->group(kControls);
+  AddPopup(command, flags, "--method", kMethod,
+           {{"subspace-warp", 4, "bends each part of it"},
+            {"perspective", 3, "tilts it"},
+            {"position-scale-rotation", 2, "turns and resizes it"},
+            {"position", 1, "only shifts it"}},
+           "How far a frame is changed, less where the picture comes out bent")
+      ->group(kControls);
+
+  AddSlider(command, flags, "--maximum-scale", kMaximumScale, "PERCENT", 100, 10000, 150,
+            "The most that crop-auto-scale may enlarge; what that leaves empty stays black")
+      ->group(kFinerControls);
+  AddSlider(command, flags, "--crop-less-smooth-more", kCropLessSmoothMore, "PERCENT", 0, 100, 50,
+            "How still the crop window stands: above 50 it follows less of the motion, which is "
+            "calmer and crops more; below 50 it gives way to sudden moves")
+      ->group(kFinerControls);
+  AddSlider(command, flags, "--additional-scale", kAdditionalScale, "PERCENT", 0, 10000, 100,
+            "A scale on top of the others")
+      ->group(kFinerControls);
+  AddSlider(command, flags, "--action-safe-margin", kActionSafeMargin, "PERCENT", 0, 100, 0,
+            "A border of the frame that crop-auto-scale need not fill")
+      ->group(kFinerControls);
   AddSwitch(command, flags, "--detailed-analysis", kDetailedAnalysis,
-            "Track more features; slower");
-  AddChoice(command, flags, "--rolling-shutter-ripple", kRollingShutterRipple,
-            {{"automatic", 1}, {"enhanced", 2}}, "automatic",
-            "How hard the warp works against rolling shutter");
-  AddNumber(command, flags, "--crop-less-smooth-more", kCropLessSmoothMore, "PERCENT", 0, 100, 50,
-            "Let the crop window follow less of the motion");
-  AddNumber(command, flags, "--synthesis-input-range", kSynthesisInputRange, "SECONDS", 0, 999, 0.5,
-            "How far away in time synthesize-edges may take its pixels from");
-  AddNumber(command, flags, "--synthesis-edge-feather", kSynthesisEdgeFeather, "PIXELS", 0, 999, 10,
-            "How softly synthesize-edges joins frames at their edges");
+            "Track four times as many features in larger windows, for clips whose motion comes "
+            "out wrong; slower");
+  AddPopup(command, flags, "--rolling-shutter-ripple", kRollingShutterRipple,
+           {{"automatic", 1, "works where it is sure"},
+            {"enhanced", 2, "works harder, on less evidence"}},
+           "What perspective and subspace-warp do against the wobble of a rolling shutter")
+      ->group(kFinerControls);
+  AddSlider(command, flags, "--synthesis-input-range", kSynthesisInputRange, "SECONDS", 0, 999, 0.5,
+            "How far away in time synthesize-edges looks for pixels; more fills more and is slower")
+      ->group(kFinerControls);
+  AddSlider(command, flags, "--synthesis-edge-feather", kSynthesisEdgeFeather, "PIXELS", 0, 999, 10,
+            "How softly synthesize-edges joins one frame to another")
+      ->group(kFinerControls);
   AddSwitch(command, flags, "--hide-warning-banner", kHideWarningBanner,
             "Draw no banner over frames that could not be steadied as asked");
   command.add_option("--param", flags.params, "Any parameter of `calmframe params`; repeatable")
       ->type_name("NAME=VALUE")
       ->allow_extra_args(false)
-      ->group("Controls");
+      ->group(kFinerControls);
   command.add_flag("--experimental", flags.experimental, "Offer the experimental parameters too")
-      ->group("Controls");
+      ->group(kFinerControls);
 }
 
 bool HasFlag(std::int32_t disk_id) {

@@ -1,36 +1,57 @@
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <cstdio>
 #include <exception>
+#include <functional>
 #include <new>
 #include <nlohmann/json.hpp>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "apps/calmframe/analyze_command.h"
 #include "apps/calmframe/demo_command.h"
 #include "apps/calmframe/exit_codes.h"
 #include "apps/calmframe/failures.h"
-#include "apps/calmframe/nearest_match.h"
+#include "apps/calmframe/manual/help_text.h"
+#include "apps/calmframe/manual/man_page.h"
+#include "apps/calmframe/manual/shell_completion.h"
 #include "apps/calmframe/params_command.h"
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/project_commands.h"
 #include "apps/calmframe/report_command.h"
 #include "apps/calmframe/stabilize_command.h"
+#include "host/base/nearest_match.h"
 #include "host/media/clip.h"
 
 namespace calmframe {
 namespace {
 
-// The chosen command's flags and the commands' names, for a hint at a misspelt one.
-std::vector<std::string> KnownNames(const CLI::App& program) {
-  std::vector<std::string> names;
+// A word that is no command, or no flag of the command that it stands behind, in one line; empty
+// where all are known.
+std::string UnknownWord(const CLI::App& program, int argc, char** argv) {
+  if (argc < 2) return "";
+  const std::string first = argv[1];
+  std::vector<std::string> names = {"--help", "--version"};
+  std::vector<std::string> flags = {"--help"};
+  const CLI::App* chosen = nullptr;
   for (const CLI::App* command : program.get_subcommands({})) {
     names.push_back(command->get_name());
+    if (command->get_name() != first) continue;
+    chosen = command;
     for (const CLI::Option* option : command->get_options()) {
-      if (!option->get_lnames().empty()) names.push_back("--" + option->get_lnames()[0]);
+      for (const std::string& name : option->get_lnames()) flags.push_back("--" + name);
     }
   }
-  return names;
+  if (!chosen) return "unknown command " + first + NearestHint(first, names);
+  for (int i = 2; i < argc; ++i) {
+    const std::string word = std::string(argv[i]).substr(0, std::string(argv[i]).find('='));
+    if (word.rfind("--", 0) != 0 || std::find(flags.begin(), flags.end(), word) != flags.end()) {
+      continue;
+    }
+    return "unknown flag " + word + NearestHint(word, flags);
+  }
+  return "";
 }
 
 int Fail(ExitCode code, const std::string& line, bool json = false) {
@@ -46,26 +67,72 @@ int Fail(ExitCode code, const std::string& line, bool json = false) {
 
 int FailUsage(const CLI::App& program, const CLI::ParseError& error, int argc, char** argv) {
   std::string line = error.what();
-  for (char& c : line) {
-    if (c == '\n') c = ' ';
+  std::replace(line.begin(), line.end(), '\n', ' ');
+  const bool extra = dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr;
+  if (argc < 2) {
+    line = "no command given, such as calmframe stabilize IN OUT";
+  } else if (extra || dynamic_cast<const CLI::RequiredError*>(&error)) {
+    // A misspelt flag's value looks like one word too many, and so on.
+    const std::string unknown = UnknownWord(program, argc, argv);
+    if (!unknown.empty())
+      line = unknown;
+    else if (extra)
+      line = "one word too many" + line.substr(line.find(':'));
+  } else if (dynamic_cast<const CLI::ArgumentMismatch*>(&error)) {
+    const std::string flag = line.substr(0, line.find(':'));
+    const bool none = line.find("missing") != std::string::npos;
+    line = flag + (none ? " takes a value" : " is given more than once");
   }
-  if (dynamic_cast<const CLI::ExtrasError*>(&error) ||
-      dynamic_cast<const CLI::RequiredError*>(&error)) {
-    const std::vector<std::string> names = KnownNames(program);
-    for (int i = 1; i < argc; ++i) {
-      const std::string word = std::string(argv[i]).substr(0, std::string(argv[i]).find('='));
-      const bool may_be_name = i == 1 || word.rfind("--", 0) == 0;
-      if (!may_be_name || std::find(names.begin(), names.end(), word) != names.end()) continue;
-      const std::string nearest = NearestMatch(word, names);
-      line = "unknown " + word + (nearest.empty() ? "" : "; did you mean " + nearest + "?");
-      break;
-    }
-  }
-  return Fail(kUsage, line + " (calmframe --help tells more)");
+  const auto parsed = program.get_subcommands();
+  const std::string command = parsed.empty() ? "" : parsed[0]->get_name() + " ";
+  return Fail(kUsage, line + " (calmframe " + command + "--help tells more)");
 }
 
+// Added to the parser but to no list: what the packages bring is written by the program itself.
+class WriteCommand {
+ public:
+  WriteCommand(CLI::App& program, const std::string& name,
+               std::function<std::string(const CLI::App&)> text)
+      : program_(program), command_(program.add_subcommand(name)), text_(std::move(text)) {
+    command_->group("");
+  }
+  bool chosen() const { return command_->parsed(); }
+  void Run() const { std::fputs(text_(program_).c_str(), stdout); }
+
+ private:
+  const CLI::App& program_;
+  CLI::App* const command_;
+  const std::function<std::string(const CLI::App&)> text_;
+};
+
+constexpr char kDescription[] =
+    "Steadies shaky video\n\n"
+    "A clip goes in, a steady clip comes out. To see what it does without a clip of your own, run "
+    "calmframe demo.";
+
+constexpr char kFooter[] =
+    "Examples:\n"
+    "  calmframe stabilize shaky.mp4 steady.mp4\n"
+    "  calmframe stabilize --help\n"
+    "\n"
+    "Exit codes:\n"
+    "  0    done\n"
+    "  2    usage: an unknown word, or a value out of range\n"
+    "  3    input: a clip or project that can't be read\n"
+    "  4    output: it exists already, or can't be written\n"
+    "  5    the clip could not be analysed or solved\n"
+    "  130  interrupted\n"
+    "\n"
+    "Environment:\n"
+    "  CALMFRAME_PLUGIN  the plug-in to load in place of the one that came along";
+
 int Run(int argc, char** argv) {
-  CLI::App program("Steadies shaky video.", "calmframe");
+  CLI::App program(kDescription, "calmframe");
+  program.formatter_fn([](const CLI::App* command, const std::string&, CLI::AppFormatMode) {
+    return manual::HelpText(*command);
+  });
+  program.set_version_flag("--version", "calmframe " CALMFRAME_VERSION, "Show the version");
+  program.footer(kFooter);
   program.require_subcommand(1);
   StabilizeCommand stabilize(program);
   DemoCommand demo(program);
@@ -75,6 +142,17 @@ int Run(int argc, char** argv) {
   InfoCommand info(program);
   TracksCommand tracks(program);
   ReportCommand report(program);
+  const WriteCommand writers[] = {
+      {program, "write-man-page",
+       [](const CLI::App& app) { return manual::ManPage(app, CALMFRAME_VERSION); }},
+      {program, "write-bash-completion", manual::BashCompletion},
+      {program, "write-zsh-completion", manual::ZshCompletion},
+      {program, "write-fish-completion", manual::FishCompletion}};
+  char help_flag[] = "--help";
+  if (argc > 1 && std::string(argv[1]) == "help") {
+    argv[1] = argc > 2 ? argv[2] : help_flag;
+    if (argc > 2) argv[2] = help_flag;
+  }
   try {
     program.parse(argc, argv);
   } catch (const CLI::Success& success) {
@@ -95,6 +173,9 @@ int Run(int argc, char** argv) {
     if (info.chosen()) info.Run();
     if (tracks.chosen()) tracks.Run();
     if (report.chosen()) report.Run();
+    for (const WriteCommand& writer : writers) {
+      if (writer.chosen()) writer.Run();
+    }
     return kDone;
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
 #include "apps/calmframe/plugin_path.h"
 #include "host/effects/host.h"
@@ -45,11 +46,18 @@ nlohmann::ordered_json JsonOf(const HX_ParamDef& param, double value) {
 }  // namespace
 
 ParamsCommand::ParamsCommand(CLI::App& program)
-    : command_(program.add_subcommand("params", "List the effect's parameters")) {
-  command_->add_option("--project", project_, "Present values are those of this saved work")
-      ->type_name("FILE");
-  AddControlFlags(*command_, controls_);
+    : command_(program.add_subcommand(
+          "params",
+          "List every parameter with its range and default\n\n"
+          "The names are those that --param takes. Where a value differs from the default, by a "
+          "flag or in saved work, it is told too.")) {
+  AddFile(*command_, "--project", project_, "Tell the values that this saved work has");
   command_->add_flag("--json", json_, "As a JSON array");
+  AddControlFlags(*command_, controls_);
+  command_->footer(
+      "Examples:\n"
+      "  calmframe params\n"
+      "  calmframe params --experimental --param \"Rank=12\" --json");
 }
 
 void ParamsCommand::Run() {

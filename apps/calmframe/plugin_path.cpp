@@ -11,9 +11,8 @@ std::string PluginPath() {
   constexpr char kLibrary[] = "calmframe.hxp";
   std::error_code error;
   const fs::path folder = fs::read_symlink("/proc/self/exe", error).parent_path();
-  const fs::path installed = folder.parent_path() / "lib" / "calmframe" / kLibrary;
-  if (!fs::exists(folder / kLibrary, error) && fs::exists(installed, error)) return installed;
-  return folder / kLibrary;
+  const fs::path installed = folder / CALMFRAME_INSTALLED_PLUGIN_DIR / kLibrary;
+  return fs::exists(folder / kLibrary, error) ? folder / kLibrary : installed.lexically_normal();
 }
 
 }  // namespace calmframe

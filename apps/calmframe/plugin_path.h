@@ -5,7 +5,7 @@
 namespace calmframe {
 
 // Where the plug-in's library lies: what the environment's CALMFRAME_PLUGIN names, else beside the
-// program, else in lib/calmframe beside the program's folder.
+// program, as in a build, else where an installation has it, seen from the program.
 std::string PluginPath();
 
 }  // namespace calmframe

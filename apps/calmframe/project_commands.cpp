@@ -2,10 +2,12 @@
 
 #include <cstdio>
 #include <filesystem>
+#include <limits>
 #include <memory>
 #include <nlohmann/json.hpp>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/steady_clip.h"
@@ -32,15 +34,27 @@ media::ClipInfo PartOf(const media::ClipInfo& info, const FrameRange& range) {
 }  // namespace
 
 RenderCommand::RenderCommand(CLI::App& program)
-    : command_(program.add_subcommand("render", "Draw saved work, or a part of it")) {
-  command_->add_option("--project", project_, "The saved work")->type_name("FILE")->required();
-  command_->add_option("OUT", output_, "The steady clip to write; - for raw frames to a pipe")
+    : command_(program.add_subcommand(
+          "render",
+          "Draw saved work, or a part of it\n\n"
+          "With --from and --to a part, to look at before the whole is drawn; such a part is "
+          "without sound.")) {
+  AddFile(*command_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe")
       ->required();
-  command_->add_option("--from", from_, "First frame, counted from 0")->group("Output");
-  command_->add_option("--to", to_, "Frame behind the last; the clip's end at first")
-      ->group("Output");
+  AddFile(*command_, "--project", project_, "The saved work")->required();
+  constexpr int kMost = std::numeric_limits<int>::max();
+  AddNumber<int>(
+      *command_, "--from", [this](int frame) { from_ = static_cast<std::size_t>(frame); }, "FRAME",
+      0, kMost, "First frame, counted from 0");
+  AddNumber<int>(
+      *command_, "--to", [this](int frame) { to_ = static_cast<std::size_t>(frame); }, "FRAME", 0,
+      kMost, "Frame behind the last; the clip's end at first");
   AddOutputFlags(*command_, flags_);
   AddRunFlags(*command_, run_);
+  command_->footer(
+      "Examples:\n"
+      "  calmframe render --project shaky.calm steady.mp4\n"
+      "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20");
 }
 
 void RenderCommand::Run() {
@@ -53,6 +67,7 @@ void RenderCommand::Run() {
     throw UsageFailure("--from and --to must lie within the clip's " +
                        std::to_string(info.frame_count) + " frames");
   }
+  KeepApart(output_, {project_, clip->path()});
   const std::unique_ptr<media::ClipWriter> writer = media::ClipWriter::Create(
       output_, PartOf(info, range), info.width, info.height, flags_.encode);
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
@@ -64,9 +79,13 @@ void RenderCommand::Run() {
 }
 
 InfoCommand::InfoCommand(CLI::App& program)
-    : command_(program.add_subcommand("info", "Tell what saved work holds")) {
-  command_->add_option("PROJECT", project_, "The saved work")->required();
+    : command_(program.add_subcommand(
+          "info", "Tell what saved work holds, and whether its clip is still the one")) {
+  AddFile(*command_, "PROJECT", project_, "The saved work")->required();
   command_->add_flag("--json", json_, "As a JSON object");
+  command_->footer(
+      "Examples:\n"
+      "  calmframe info shaky.calm");
 }
 
 void InfoCommand::Run() {
@@ -102,8 +121,11 @@ void InfoCommand::Run() {
 
 TracksCommand::TracksCommand(CLI::App& program)
     : command_(program.add_subcommand("tracks", "Write the tracks of saved work to a file")) {
-  command_->add_option("PROJECT", project_, "The saved work")->required();
-  command_->add_option("OUT", output_, "The track file, .trk")->required();
+  AddFile(*command_, "PROJECT", project_, "The saved work")->required();
+  AddFile(*command_, "OUT", output_, "The track file, .trk")->required();
+  command_->footer(
+      "Examples:\n"
+      "  calmframe tracks shaky.calm shaky.trk");
 }
 
 void TracksCommand::Run() {

@@ -2,16 +2,16 @@
 
 #include <filesystem>
 
+#include "apps/calmframe/flags.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
-  command
-      .add_option("--project", project,
-                  "Take up saved work from this file, if it is there, and save to it")
-      ->type_name("FILE")
-      ->group("Output");
+  AddFile(command, "--project", project,
+          "Take up saved work from this file where it is there, with its controls, and save to it; "
+          "what still stands of it is not done again")
+      ->group("Saved work");
 }
 
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
@@ -31,6 +31,18 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
 std::unique_ptr<SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
   const host::Project project = host::LoadProject(path);
   return std::make_unique<SteadyClip>(project, host::FindClip(path, project), controls);
+}
+
+void KeepApart(const std::string& output, const std::vector<std::string>& inputs) {
+  for (const std::string& input : inputs) {
+    if (input.empty()) continue;
+    std::error_code unknown;
+    if (std::filesystem::equivalent(output, input, unknown) ||
+        std::filesystem::weakly_canonical(output, unknown) ==
+            std::filesystem::weakly_canonical(input, unknown)) {
+      throw media::Failure(media::Failure::Side::output, output + ": is an input itself");
+    }
+  }
 }
 
 void Unsaved::Throw() const {

@@ -4,6 +4,7 @@
 #include <memory>
 #include <string>
 #include <utility>
+#include <vector>
 
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
@@ -22,6 +23,10 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
 // host::ProjectFailure.
 std::unique_ptr<SteadyClip> OpenSaved(const std::string& project,
                                       const ControlFlags& controls = {});
+
+// Nothing of the user's is written over by a result of it: throws media::Failure (output) where
+// `output` is one of `inputs` under any name. Empty names stand for no file.
+void KeepApart(const std::string& output, const std::vector<std::string>& inputs);
 
 // A save that failed: the work is done all the same, and whoever asked for it gets its result
 // first.

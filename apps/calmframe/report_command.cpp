@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
@@ -264,11 +265,18 @@ std::string NameOf(const std::string& path) {
 }  // namespace
 
 ReportCommand::ReportCommand(CLI::App& program)
-    : command_(program.add_subcommand("report", "Show saved work as a page: paths, tracks, crop")) {
-  command_->add_option("PROJECT", project_, "The saved work")->required();
-  command_->add_option("OUT", output_, "The page to write, .html")->required();
+    : command_(program.add_subcommand("report",
+                                      "Show saved work as a page\n\n"
+                                      "Camera path before and after, tracks, models, crop, what is "
+                                      "left empty, and a filmstrip, "
+                                      "in one file for any browser.")) {
+  AddFile(*command_, "PROJECT", project_, "The saved work")->required();
+  AddFile(*command_, "OUT", output_, "The page to write, .html")->required();
   command_->add_flag("--overwrite", overwrite_, "Replace an existing file")->group("Output");
   AddRunFlags(*command_, run_);
+  command_->footer(
+      "Examples:\n"
+      "  calmframe report shaky.calm report.html");
 }
 
 void ReportCommand::Run() {
@@ -278,6 +286,7 @@ void ReportCommand::Run() {
   ControlFlags controls;
   controls.experimental = true;  // tracks and the solve's log are for experts
   const std::unique_ptr<SteadyClip> clip = OpenSaved(project_, controls);
+  KeepApart(output_, {clip->path()});
   const media::ClipInfo& info = clip->info();
   const double rate =
       static_cast<double>(info.frame_rate.num) / static_cast<double>(info.frame_rate.den);

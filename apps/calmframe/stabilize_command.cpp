@@ -1,9 +1,9 @@
 #include "apps/calmframe/stabilize_command.h"
 
 #include <memory>
-#include <vector>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
 #include "platform/tessel/threads.h"
@@ -29,35 +29,52 @@ void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
   }
 }
 
+namespace {
+
+constexpr char kOutput[] = "Output";
+constexpr char kRunning[] = "Running";
+
+}  // namespace
+
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
-  command.add_option("--threads", flags.threads, "Processors to use")
-      ->check(CLI::Range(1, 1024))
-      ->group("Output");
-  CLI::Option* quiet = command.add_flag("--quiet", flags.quiet, "Show no progress");
-  quiet->group("Output");
-  command.add_flag("--json", flags.json, "Show progress as one JSON object a line")
+  AddNumber<int>(
+      command, "--threads", [&flags](int threads) { flags.threads = threads; }, "N", 1, 1024,
+      "Processors to use; all at first")
+      ->group(kRunning);
+  CLI::Option* quiet =
+      command.add_flag("--quiet", flags.quiet, "Show no progress; warnings and errors still");
+  quiet->group(kRunning);
+  command
+      .add_flag("--json", flags.json,
+                "Show progress, warnings and errors as JSON objects, one a line, for programs")
       ->excludes(quiet)
-      ->group("Output");
+      ->group(kRunning);
 }
 
 void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
-  command.add_option("--codec", flags.encode.codec, "Encoder, or the name of what it encodes")
-      ->type_name("NAME")
-      ->group("Output");
+  AddNumber<int>(
+      command, "--crf", [&flags](int crf) { flags.encode.crf = crf; }, "N", 0, 63,
+      "How much the encoder may lose: less looks better and makes larger files")
+      ->default_str(std::to_string(flags.encode.crf))
+      ->group(kOutput);
   command
-      .add_option("--crf", flags.encode.crf, "Quality of the encoder: less is better and larger")
-      ->check(CLI::Range(0, 63))
-      ->capture_default_str()
-      ->group("Output");
-  command.add_option("--pixel-format", flags.encode.pixel_format, "Pixel format of the encoder")
+      .add_option("--codec", flags.encode.codec,
+                  "Encoder, such as libx265, or the name of what it encodes; at first H.264, or "
+                  "what the kind of file takes")
       ->type_name("NAME")
-      ->group("Output");
-  command.add_option("--depth", flags.depth, "Bits of a component in the render")
-      ->check(CLI::IsMember(std::vector<int>{8, 16, 32}))
-      ->type_name("8|16|32")
-      ->group("Output");
-  command.add_flag("--overwrite", flags.encode.overwrite, "Replace an existing file")
-      ->group("Output");
+      ->group(kOutput);
+  command
+      .add_option("--pixel-format", flags.encode.pixel_format,
+                  "Pixel format of the encoder; at first 4:2:0 of the clip's depth")
+      ->type_name("NAME")
+      ->group(kOutput);
+  AddChoice(
+      command, "--depth", [&flags](const std::string& bits) { flags.depth = std::stoi(bits); },
+      {"8", "16", "32"},
+      "Bits of a component while frames are drawn; at first 8, or 16 for deeper clips")
+      ->group(kOutput);
+  command.add_flag("--overwrite", flags.encode.overwrite, "Replace OUT where it exists")
+      ->group(kOutput);
 }
 
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
@@ -67,6 +84,7 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
   const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls);
   const media::ClipInfo& info = clip->info();
   if (!info.warning.empty()) progress.Warn(info.warning);
+  KeepApart(output, {project});
   // Made first, so that an output that cannot be written costs nobody an analysis.
   const std::unique_ptr<media::ClipWriter> writer =
       media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
@@ -80,14 +98,27 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
 }
 
 StabilizeCommand::StabilizeCommand(CLI::App& program)
-    : command_(program.add_subcommand("stabilize", "Steady a clip")) {
-  command_->add_option("IN", input_, "The shaky clip")->required();
-  command_->add_option("OUT", output_, "The steady clip to write; - for raw frames to a pipe")
+    : command_(program.add_subcommand(
+          "stabilize",
+          "Steady a clip\n\n"
+          "Writes the clip IN to OUT with its shake smoothed away; sound, subtitles and time "
+          "stamps "
+          "stay as they were. It needs no flag. Where the result isn't yet as you want it, reach "
+          "for --smoothness first, then for --framing.\n\n"
+          "OUT's extension picks the kind of file. OUT is there when it is whole: a run that fails "
+          "or is stopped leaves none.")) {
+  AddFile(*command_, "IN", input_, "The shaky clip")->required();
+  AddFile(*command_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe")
       ->required();
-  AddProjectFlag(*command_, project_);
   AddControlFlags(*command_, controls_);
   AddOutputFlags(*command_, flags_);
+  AddProjectFlag(*command_, project_);
   AddRunFlags(*command_, run_);
+  command_->footer(
+      "Examples:\n"
+      "  calmframe stabilize shaky.mp4 steady.mp4\n"
+      "  calmframe stabilize walk.mp4 calm.mp4 --smoothness 100\n"
+      "  calmframe stabilize talk.mp4 still.mp4 --result no-motion");
 }
 
 void StabilizeCommand::Run() {

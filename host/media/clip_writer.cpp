@@ -33,10 +33,13 @@ class FfmpegWriter final : public ClipWriter {
     }
     const AVOutputFormat* format = to_pipe_ ? av_guess_format("yuv4mpegpipe", nullptr, nullptr)
                                             : av_guess_format(nullptr, path.c_str(), nullptr);
+    std::error_code ignored;
+    if (std::filesystem::is_directory(path, ignored)) Fail("is a directory");
     const std::string extension = std::filesystem::path(path).extension().string();
     if (!format || format->video_codec == AV_CODEC_ID_NONE || (format->flags & AVFMT_NOFILE)) {
-      Fail(extension.empty() ? "its name has no extension to tell the kind of file"
-                             : "no kind of video file ends in '" + extension + "'");
+      Fail((extension.empty() ? "its name has no extension to tell the kind of file"
+                              : "no kind of video file ends in '" + extension + "'") +
+           "; .mp4, .mov, .mkv and .webm are some");
     }
     if (!to_pipe_) file_.emplace(path, source.path, settings.overwrite);
     encoder_.emplace(shown_, *format, source, width, height, settings, warnings_);
@@ -48,6 +51,12 @@ class FfmpegWriter final : public ClipWriter {
     container->strict_std_compliance = FF_COMPLIANCE_UNOFFICIAL;
     AVStream* stream = NotNull(avformat_new_stream(container, nullptr));
     Check(avcodec_parameters_from_context(stream->codecpar, &encoder_->context()));
+    const bool isobmff =
+        std::strcmp(format->name, "mp4") == 0 || std::strcmp(format->name, "mov") == 0;
+    if (isobmff && stream->codecpar->codec_id == AV_CODEC_ID_HEVC) {
+      // Some players show no hev1, the muxer's own choice; parameter sets are in the header anyhow.
+      stream->codecpar->codec_tag = MKTAG('h', 'v', 'c', '1');
+    }
     stream->time_base = encoder_->time_base();
     stream->sample_aspect_ratio = encoder_->context().sample_aspect_ratio;
     stream->avg_frame_rate = encoder_->context().framerate;

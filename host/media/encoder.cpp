@@ -2,30 +2,11 @@
 
 #include <algorithm>
 #include <cstring>
-#include <numeric>
+
+#include "host/base/nearest_match.h"
 
 namespace calmframe::media {
 namespace {
-
-std::size_t EditDistance(const std::string& a, const std::string& b) {
-  std::vector<std::size_t> row(b.size() + 1);
-  std::iota(row.begin(), row.end(), std::size_t{0});
-  for (std::size_t i = 0; i < a.size(); ++i) {
-    std::size_t diagonal = row[0]++;
-    for (std::size_t j = 0; j < b.size(); ++j) {
-      const std::size_t replaced = diagonal + (a[i] != b[j]);
-      diagonal = row[j + 1];
-      row[j + 1] = std::min({replaced, diagonal + 1, row[j] + 1});
-    }
-  }
-  return row.back();
-}
-
-std::string Nearest(const std::string& name, const std::vector<std::string>& known) {
-  return *std::min_element(known.begin(), known.end(), [&](const auto& a, const auto& b) {
-    return EditDistance(name, a) < EditDistance(name, b);
-  });
-}
 
 const AVCodec* FindEncoder(const std::string& name) {
   const AVCodec* codec = avcodec_find_encoder_by_name(name.c_str());
@@ -64,8 +45,7 @@ AVPixelFormat ChoosePixelFormat(const std::string& shown, const AVCodec& codec,
     for (const AVPixelFormat f : usable) names.emplace_back(av_get_pix_fmt_name(f));
     if (names.empty()) names = {"yuv420p", "yuv422p", "yuv444p", "yuv420p10le"};
     throw Failure(Failure::Side::output, shown + ": pixel format '" + name + "' is not one of " +
-                                             codec.name + "'s, the nearest is '" +
-                                             Nearest(name, names) + "'");
+                                             codec.name + "'s" + NearestHint(name, names));
   }
   const bool odd = width % 2 != 0 || height % 2 != 0;
   const bool deep = source.bit_depth > 8;
@@ -101,9 +81,8 @@ Encoder::Encoder(const std::string& shown, const AVOutputFormat& format, const C
   if (!settings.codec.empty()) {
     codec = FindEncoder(settings.codec);
     if (!codec) {
-      throw Failure(Failure::Side::output, shown + ": no video codec '" + settings.codec +
-                                               "', the nearest is '" +
-                                               Nearest(settings.codec, EncoderNames()) + "'");
+      throw Failure(Failure::Side::output, shown + ": no video codec '" + settings.codec + "'" +
+                                               NearestHint(settings.codec, EncoderNames()));
     }
     if (avformat_query_codec(&format, codec->id, FF_COMPLIANCE_UNOFFICIAL) == 0) {
       throw Failure(Failure::Side::output, shown + ": a " + format.name + " file can't hold " +
@@ -204,6 +183,8 @@ bool Encoder::Open(const AVCodec& codec, const AVOutputFormat& format, const Cli
     c.flags |= AV_CODEC_FLAG_QSCALE;
     c.global_quality = FF_QP2LAMBDA * std::clamp(settings.crf / 6, 1, 31);
   }
+  // It writes to the standard error past the library's log.
+  if (c.priv_data) av_opt_set(c.priv_data, "x265-params", "log-level=error", 0);
   error = avcodec_open2(&c, &codec, nullptr);
   return error >= 0;
 }

@@ -53,7 +53,8 @@ OutputFile::OutputFile(const std::string& path, const std::string& source, bool 
   if (file < 0) {
     const int error = errno;
     temporary_.clear();
-    Fail(path, std::string("can't be written: ") + std::strerror(error));
+    Fail(path, "can't be written: " + (error == ENOENT ? "there is no folder " + folder.string()
+                                                       : std::string(std::strerror(error))));
   }
   close(file);
 }

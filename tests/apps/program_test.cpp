@@ -62,24 +62,40 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
     EXPECT_EQ(outcome.code, 4) << output;
     ExpectOneLine(outcome, "");
   }
+  ExpectOneLine(Run("stabilize in.mp4 out.mp4 --codec libx624"), "did you mean libx264?");
+  ExpectOneLine(Run("stabilize in.mp4 out.mp4 --pixel-format yuv420"), "did you mean yuv420p?");
+  ExpectOneLine(Run("stabilize in.mp4 no/such/folder.mp4"), "there is no folder no/such\n");
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "there.mp4"));
   std::ifstream kept(Path("there.mp4"));
   EXPECT_EQ(std::string(std::istreambuf_iterator<char>(kept), {}), "precious");
   EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet").code, 0);
   EXPECT_EQ(ClipReader::Open(Path("there.mp4"))->info().frame_count, 5u);
+  // An encoder that likes to talk, and the tag that players want.
+  EXPECT_THAT(Run("stabilize in.mp4 there.mp4 --overwrite --quiet --codec hevc").text,
+              ::testing::Not(HasSubstr("x265 [")));
+  std::ifstream hevc(Path("there.mp4"));
+  EXPECT_THAT(std::string(std::istreambuf_iterator<char>(hevc), {}), HasSubstr("hvc1"));
 }
 
 TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
   const struct {
     const char* arguments;
     const char* part;
-  } cases[] = {{"stabilise a b", "did you mean stabilize?"},
+  } cases[] = {{"stabilise a b", "unknown command stabilise; did you mean stabilize?"},
+               {"frobnicate", "unknown command frobnicate ("},
                {"stabilize a b --smothness 3", "did you mean --smoothness?"},
+               {"stabilize a b --smooth=3", "did you mean --smoothness?"},
+               {"info a --smoothness 3", "unknown flag --smoothness (calmframe info --help"},
+               {"stabilize a b c", "one word too many: c ("},
                {"stabilize a b --method perspectiv", "did you mean perspective?"},
+               {"stabilize a b --framing synthesise", "did you mean synthesize-edges?"},
                {"stabilize a b --smoothness 2000", "2000"},
                {"stabilize a b --smoothness nan", "nan"},
                {"stabilize a b --additional-scale=-inf", "inf"},
-               {"stabilize a b --depth 12", "12"},
+               {"stabilize a b --crf x", "'x' is no number"},
+               {"stabilize a b --crf", "--crf takes a value"},
+               {"stabilize a b --depth 12", "none of 8, 16, 32"},
+               {"render --project a b --from -3", "0 or more"},
                {"stabilize a b --json --quiet", "--quiet"},
                {"params --param Smothness=3", "did you mean 'Smoothness'?"},
                {"params --param \"Maximum Scale=99\"", "100 to 10000"},
@@ -88,13 +104,13 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
                {"params --param \"Hide Warning Banner=maybe\"", "neither on nor off"},
                {"params --param Smoothness", "NAME=VALUE"},
                {"stabilize a", "OUT"},
-               {"", "calmframe --help"}};
+               {"", "calmframe stabilize IN OUT"}};
   for (const auto& c : cases) {
     const Outcome outcome = Run(c.arguments);
     EXPECT_EQ(outcome.code, 2) << c.arguments;
     ExpectOneLine(outcome, c.part);
   }
-  EXPECT_EQ(Run("stabilize --help").code, 0);
+  EXPECT_EQ(Run("stabilize --help").text, Run("help stabilize").text);
 }
 
 TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {

@@ -138,13 +138,24 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
 }
 
 TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
-  if (std::system("command -v chromium >/dev/null") != 0) GTEST_SKIP() << "no chromium";
   MakeClip("in.mp4", 160, 120, 20);
   ASSERT_EQ(Run("analyze in.mp4 --project p.calm --quiet").code, 0);
   ASSERT_EQ(Run("report p.calm p.html --quiet").code, 0);
+  // What the work came from is never written over, by no command and under no name.
+  const std::string clip = Content("in.mp4"), saved = Content("p.calm");
+  fs::create_hard_link(Path("in.mp4"), Path("same.mp4"));
+  for (const char* command :
+       {"report p.calm in.mp4", "report p.calm same.mp4", "report p.calm p.calm",
+        "render --project p.calm same.mp4 --from 1 --to 3", "render --project p.calm p.calm",
+        "stabilize in.mp4 p.calm --project p.calm"}) {
+    EXPECT_EQ(Run(std::string(command) + " --overwrite --quiet").code, 4) << command;
+  }
+  EXPECT_EQ(Content("in.mp4"), clip);
+  EXPECT_EQ(Content("p.calm"), saved);
   const std::string page = Content("p.html");
   EXPECT_EQ(page.find("http:"), std::string::npos) << "nothing comes from elsewhere";
   EXPECT_EQ(page.find("https:"), std::string::npos);
+  if (std::system("command -v chromium >/dev/null") != 0) GTEST_SKIP() << "no chromium";
   const std::string command =
       "cd '" + folder_.string() +
       "' && HOME=$PWD timeout 120 chromium --headless --no-sandbox "

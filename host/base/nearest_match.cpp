@@ -1,4 +1,4 @@
-#include "apps/calmframe/nearest_match.h"
+#include "host/base/nearest_match.h"
 
 #include <algorithm>
 #include <numeric>
@@ -6,6 +6,8 @@
 namespace calmframe {
 namespace {
 
+// Or, where it is less, one more than the distance to the best beginning of `b`: who stops early
+// means the whole word.
 std::size_t EditDistance(const std::string& a, const std::string& b) {
   std::vector<std::size_t> row(b.size() + 1);
   std::iota(row.begin(), row.end(), std::size_t{0});
@@ -18,7 +20,7 @@ std::size_t EditDistance(const std::string& a, const std::string& b) {
       row[j] = std::min({replaced, row[j] + 1, row[j - 1] + 1});
     }
   }
-  return row.back();
+  return std::min(row.back(), *std::min_element(row.begin(), row.end()) + 1);
 }
 
 }  // namespace
@@ -34,6 +36,11 @@ std::string NearestMatch(const std::string& name, const std::vector<std::string>
     }
   }
   return nearest;
+}
+
+std::string NearestHint(const std::string& name, const std::vector<std::string>& candidates) {
+  const std::string nearest = NearestMatch(name, candidates);
+  return nearest.empty() ? "" : "; did you mean " + nearest + "?";
 }
 
 }  // namespace calmframe

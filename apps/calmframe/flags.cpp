@@ -1,0 +1,56 @@
+#include "apps/calmframe/flags.h"
+
+#include <algorithm>
+#include <limits>
+
+#include "apps/calmframe/param_text.h"
+#include "host/base/nearest_match.h"
+
+namespace calmframe {
+
+template <class Number>
+CLI::Option* AddNumber(CLI::App& command, const std::string& flag,
+                       const std::function<void(Number)>& take, const std::string& unit,
+                       Number least, Number most, const std::string& description) {
+  const std::string range =
+      NumberText(least) +
+      (most == std::numeric_limits<Number>::max() ? " or more" : " to " + NumberText(most));
+  // CLI::Range lets "nan" through.
+  const auto check = [least, most, range](const std::string& text) {
+    Number number{};
+    if (!CLI::detail::lexical_cast(text, number)) return "'" + text + "' is no number";
+    return number >= least && number <= most ? "" : text + " is out of range: " + range;
+  };
+  return command.add_option_function<Number>(flag, take, description + "; " + range)
+      ->check(check)
+      ->take_last()
+      ->type_name(unit);
+}
+template CLI::Option* AddNumber(CLI::App&, const std::string&, const std::function<void(int)>&,
+                                const std::string&, int, int, const std::string&);
+template CLI::Option* AddNumber(CLI::App&, const std::string&, const std::function<void(double)>&,
+                                const std::string&, double, double, const std::string&);
+
+CLI::Option* AddChoice(CLI::App& command, const std::string& flag,
+                       const std::function<void(const std::string&)>& take,
+                       const std::vector<std::string>& choices, const std::string& description) {
+  const auto check = [choices](const std::string& text) {
+    const bool known = std::find(choices.begin(), choices.end(), text) != choices.end();
+    return known ? "" : NoneOf(text, choices);
+  };
+  return command.add_option_function<std::string>(flag, take, description)
+      ->check(check)
+      ->take_last()
+      ->type_name(CLI::detail::join(choices, "|"));
+}
+
+CLI::Option* AddFile(CLI::App& command, const std::string& name, std::string& path,
+                     const std::string& description) {
+  return command.add_option(name, path, description)->type_name("FILE");
+}
+
+std::string NoneOf(const std::string& text, const std::vector<std::string>& names) {
+  return "'" + text + "' is none of " + CLI::detail::join(names, ", ") + NearestHint(text, names);
+}
+
+}  // namespace calmframe

@@ -1,0 +1,12 @@
+#pragma once
+
+#include <CLI/CLI.hpp>
+#include <string>
+
+namespace calmframe::manual {
+
+// The manual page of the program, section 1, in the roff macros of man(7). `version`: as the
+// page's foot shows it.
+std::string ManPage(const CLI::App& program, const std::string& version);
+
+}  // namespace calmframe::manual
