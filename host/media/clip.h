@@ -58,7 +58,8 @@ struct ClipInfo {
   std::string codec;             // of the video stream
   int bit_depth = 8;             // of a component in the file
   bool has_alpha = false;
-  int rotation = 0;  // degrees clockwise that were applied to the pixels: 0, 90, 180 or 270
+  int rotation = 0;       // degrees clockwise that were applied to the pixels: 0, 90, 180 or 270
+  bool mirrored = false;  // left and right were swapped too, after the rotation
   ColourTags colour;
   FieldOrder field_order = FieldOrder::progressive;
   int stream = -1;      // the video stream's place in the file

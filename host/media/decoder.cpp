@@ -96,9 +96,11 @@ bool Decoder::Feed() {
       return avcodec_send_packet(codec_.get(), nullptr) >= 0;
     }
     const AVStream& from = *container_->streams[packet_->stream_index];
-    if (packet_->pts != AV_NOPTS_VALUE) {
-      last_time_ = std::max(last_time_, av_rescale_q(packet_->pts + packet_->duration,
-                                                     from.time_base, AV_TIME_BASE_Q));
+    if (TimeOrNone(packet_->pts) != AV_NOPTS_VALUE &&
+        TimeOrNone(packet_->duration) != AV_NOPTS_VALUE) {
+      const std::int64_t end =
+          av_rescale_q(packet_->pts + packet_->duration, from.time_base, AV_TIME_BASE_Q);
+      if (TimeOrNone(end) != AV_NOPTS_VALUE) last_time_ = std::max(last_time_, end);
     }
     if (&from != stream_) {
       av_packet_unref(packet_.get());

@@ -13,6 +13,7 @@ extern "C" {
 #include <libswscale/swscale.h>
 }
 
+#include <cstdint>
 #include <memory>
 #include <new>
 #include <string>
@@ -57,6 +58,13 @@ inline FramePtr NewPicture(int format, int width, int height) {
 }
 inline PacketPtr NewPacket() {
   return PacketPtr(NotNull(av_packet_alloc()));
+}
+
+// A packet's or frame's time. One beyond any clock is none, which leaves room for sums and
+// differences of times: 2^60 ns are 36 years.
+inline std::int64_t TimeOrNone(std::int64_t ticks) {
+  constexpr std::int64_t kLatest = std::int64_t{1} << 60;
+  return ticks >= -kLatest && ticks <= kLatest ? ticks : AV_NOPTS_VALUE;
 }
 
 inline std::string ErrorText(int error) {

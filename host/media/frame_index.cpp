@@ -17,24 +17,36 @@ std::int64_t OwnTime(const AVFrame& frame) {
   return frame.pts != AV_NOPTS_VALUE ? frame.pts : frame.pkt_dts;
 }
 
-int ShownRotation(const AVStream& stream) {
-  const auto* matrix = reinterpret_cast<const std::int32_t*>(
+void ReadOrientation(const AVStream& stream, ClipInfo& info) {
+  const auto* stored = reinterpret_cast<const std::int32_t*>(
       av_stream_get_side_data(&stream, AV_PKT_DATA_DISPLAYMATRIX, nullptr));
-  if (!matrix) return 0;
+  if (!stored) return;
+  std::int32_t matrix[9];
+  std::copy_n(stored, 9, matrix);
   const double determinant = double{1} * matrix[0] * matrix[4] - double{1} * matrix[1] * matrix[3];
-  if (!(determinant > 0)) return 0;  // mirrored: shown as stored
+  const bool mirrored = determinant < 0;
+  if (mirrored) {
+    // Unsigned: the least value has no opposite.
+    for (const int entry : {0, 3}) {
+      matrix[entry] = static_cast<std::int32_t>(0u - static_cast<std::uint32_t>(matrix[entry]));
+    }
+  }
   const double counterclockwise = av_display_rotation_get(matrix);
-  if (!std::isfinite(counterclockwise)) return 0;
+  if (determinant == 0 || !std::isfinite(counterclockwise)) return;
   const int quarters = static_cast<int>(std::lround(-counterclockwise / 90));
-  return ((quarters % 4) + 4) % 4 * 90;
+  info.rotation = ((quarters % 4) + 4) % 4 * 90;
+  info.mirrored = mirrored;
 }
 
 AVRational FrameRate(const AVStream& stream, const std::vector<FrameTime>& times) {
   const std::int64_t ticks = times.back().pts + times.back().duration - times.front().pts;
+  __int128 frames = __int128{static_cast<std::int64_t>(times.size())} * stream.time_base.den;
+  __int128 seconds = __int128{ticks} * stream.time_base.num;
+  for (; seconds > INT64_MAX; seconds >>= 1) frames >>= 1;
   AVRational measured{25, 1};
-  av_reduce(&measured.num, &measured.den,
-            static_cast<std::int64_t>(times.size()) * stream.time_base.den,
-            ticks * stream.time_base.num, 1 << 30);
+  av_reduce(&measured.num, &measured.den, static_cast<std::int64_t>(frames),
+            static_cast<std::int64_t>(seconds), 1 << 30);
+  if (measured.num <= 0 || measured.den <= 0) return {25, 1};
   const auto near_measured = [&](AVRational rate, double tolerance) {
     return rate.num > 0 && rate.den > 0 &&
            std::abs(av_q2d(rate) / av_q2d(measured) - 1) < tolerance;
@@ -48,8 +60,10 @@ AVRational FrameRate(const AVStream& stream, const std::vector<FrameTime>& times
 void RepairTimes(const AVStream& stream, bool fields, std::vector<FrameTime>& times) {
   std::int64_t nominal = 1;
   if (stream.avg_frame_rate.num > 0 && stream.avg_frame_rate.den > 0) {
-    nominal = std::max<std::int64_t>(
-        av_rescale_q(1, av_inv_q(stream.avg_frame_rate), stream.time_base), 1);
+    // Bounded, that a stream's worth of them has a place after its latest time.
+    nominal =
+        std::clamp<std::int64_t>(av_rescale_q(1, av_inv_q(stream.avg_frame_rate), stream.time_base),
+                                 1, std::int64_t{1} << 36);
   }
   for (std::size_t i = 0; i < times.size(); ++i) {
     std::int64_t& pts = times[i].pts;
@@ -99,8 +113,9 @@ std::string DamageLine(const Decoder& decoder, std::size_t frames) {
            " frames decode";
   }
   const AVFormatContext& container = decoder.container();
-  if (container.duration > 0 && container.start_time != AV_NOPTS_VALUE &&
+  if (container.duration > 0 && TimeOrNone(container.duration) != AV_NOPTS_VALUE &&
       container.duration_estimation_method == AVFMT_DURATION_FROM_STREAM &&
+      TimeOrNone(container.start_time) != AV_NOPTS_VALUE &&
       decoder.last_time() + AV_TIME_BASE / 2 < container.start_time + container.duration) {
     return "cut short, " + std::to_string(count) + " frames decode";
   }
@@ -139,7 +154,7 @@ std::uint64_t Fingerprint(const AVFrame& frame) {
   return hash;
 }
 
-FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info) {
+FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info, std::size_t most) {
   FrameIndex index;
   const AVStream& stream = decoder.stream();
   std::size_t top_first = 0;
@@ -147,8 +162,12 @@ FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info)
   FramePtr first;
   AVRational aspect{0, 1};
   while (FramePtr frame = decoder.Next()) {
+    if (index.size() == most) {
+      throw Failure(Failure::Side::input, path + ": more than " + std::to_string(most) + " frames");
+    }
     index.push_back({OwnTime(*frame), Fingerprint(*frame), frame->key_frame != 0});
-    info.times.push_back({frame->best_effort_timestamp, frame->pkt_duration});
+    info.times.push_back({TimeOrNone(frame->best_effort_timestamp),
+                          std::max<std::int64_t>(TimeOrNone(frame->pkt_duration), 0)});
     if (frame->interlaced_frame) ++(frame->top_field_first ? top_first : bottom_first);
     if (!first) {
       aspect = av_guess_sample_aspect_ratio(const_cast<AVFormatContext*>(&decoder.container()),
@@ -168,7 +187,7 @@ FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info)
   info.time_base = ToRatio(stream.time_base);
   info.frame_rate = ToRatio(FrameRate(stream, info.times));
   info.codec = avcodec_get_name(stream.codecpar->codec_id);
-  info.rotation = ShownRotation(stream);
+  ReadOrientation(stream, info);
   info.width = first->width;
   info.height = first->height;
   if (aspect.num <= 0 || aspect.den <= 0) aspect = {1, 1};
@@ -176,7 +195,10 @@ FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info)
     std::swap(info.width, info.height);
     aspect = av_inv_q(aspect);
   } else if (interlaced) {
-    info.field_order = top_first >= bottom_first ? FieldOrder::top_first : FieldOrder::bottom_first;
+    // Upside down, an even number of rows puts the lower field's rows on top.
+    const bool swapped = info.rotation == 180 && info.height % 2 == 0;
+    info.field_order =
+        (top_first >= bottom_first) != swapped ? FieldOrder::top_first : FieldOrder::bottom_first;
   }
   info.pixel_aspect = ToRatio(aspect);
   const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(static_cast<AVPixelFormat>(first->format));

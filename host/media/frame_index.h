@@ -11,6 +11,9 @@
 
 namespace calmframe::media {
 
+// Four days at 29 a second; an index of so many takes some 400 MB.
+constexpr std::size_t kMaximumFrames = 10'000'000;
+
 // Hash of a frame's pixels, padding left out. Tells whether decoding from a seek point gave the
 // frame that decoding from the start gives.
 std::uint64_t Fingerprint(const AVFrame& frame);
@@ -24,8 +27,9 @@ using FrameIndex = std::vector<IndexEntry>;
 
 // Decodes everything once: a container's own count and times are promises, this is what is there.
 // Fills info, with a warning where the stream is damaged. Throws Failure (input) if no frame
-// decodes.
-FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info);
+// decodes, or more than `most`.
+FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info,
+                      std::size_t most = kMaximumFrames);
 
 // Frames by number. Ascending numbers decode on; others decode from the nearest keyframe whose
 // frames prove, by time stamp and fingerprint, to be those of the index, or else from the start.

@@ -137,7 +137,10 @@ void FromComponents(const AVFrame& frame, bool full_range, Pixel* pixels,
   for (int c = 0; c < components; ++c) {
     const int depth = palette ? 8 : layout.comp[c].depth;
     scale[c] = 1.0f / static_cast<float>((1 << depth) - 1);
-    if (grey && c == 0 && !full_range) {
+    if (frame.format == AV_PIX_FMT_MONOWHITE) {
+      black = 1;
+      scale[c] = -1;
+    } else if (grey && c == 0 && !full_range && depth >= 8) {
       black = static_cast<float>(16 << (depth - 8));
       scale[c] = 1.0f / static_cast<float>(219 << (depth - 8));
     }
@@ -178,17 +181,30 @@ void FromPlanes8(const AVFrame& gbr, bool alpha, HX_Pixel8* pixels, std::ptrdiff
   }
 }
 
-// Rotates by quarters clockwise; width, height: of `stored`.
+// Rotates by quarters clockwise, then swaps left and right if `mirrored`; width, height: of
+// `stored`.
 template <class Pixel>
-void Turn(const Pixel* stored, int width, int height, int rotation, Pixel* pixels,
+void Turn(const Pixel* stored, int width, int height, int rotation, bool mirrored, Pixel* pixels,
           std::ptrdiff_t row_bytes) {
+  const int last_x = (rotation % 180 == 0 ? width : height) - 1;
   for (int top = 0; top < height; top += kTurnTile) {
     for (int left = 0; left < width; left += kTurnTile) {
       for (int y = top; y < std::min(top + kTurnTile, height); ++y) {
         for (int x = left; x < std::min(left + kTurnTile, width); ++x) {
-          const int to_x = rotation == 90 ? height - 1 - y : rotation == 180 ? width - 1 - x : y;
-          const int to_y = rotation == 90 ? x : rotation == 180 ? height - 1 - y : width - 1 - x;
-          Row(pixels, row_bytes, to_y)[to_x] = stored[std::ptrdiff_t{y} * width + x];
+          int to_x = x;
+          int to_y = y;
+          if (rotation == 90) {
+            to_x = height - 1 - y;
+            to_y = x;
+          } else if (rotation == 180) {
+            to_x = width - 1 - x;
+            to_y = height - 1 - y;
+          } else if (rotation == 270) {
+            to_x = y;
+            to_y = width - 1 - x;
+          }
+          Row(pixels, row_bytes, to_y)[mirrored ? last_x - to_x : to_x] =
+              stored[std::ptrdiff_t{y} * width + x];
         }
       }
     }
@@ -236,7 +252,8 @@ void Scaler::ScalePart(const AVFrame& from, AVFrame& to, const ColourModel& mode
                            model.chroma == AVCHROMA_LOC_TOP || model.chroma == AVCHROMA_LOC_BOTTOM;
       const bool top = model.chroma == AVCHROMA_LOC_TOPLEFT || model.chroma == AVCHROMA_LOC_TOP;
       // In 1/256 of a luma sample.
-      if (layout.log2_chroma_w == 1) set(across, centred ? 128 : 0);
+      const int w = layout.log2_chroma_w;
+      if (w > 0) set(across, centred ? (128 << w) - 128 : 0);
       if (layout.log2_chroma_h == 1) set(down, part == 1 ? 64 : part == 2 ? 192 : top ? 0 : 128);
     };
     position("src_h_chr_pos", "src_v_chr_pos", from);
@@ -316,14 +333,14 @@ void FrameToPixels::Convert(const AVFrame& frame, Pixel* pixels, std::ptrdiff_t 
     av_frame_copy_props(&resized, &frame);
     fitting = &resized;
   }
-  if (info_.rotation == 0) {
+  if (info_.rotation == 0 && !info_.mirrored) {
     ConvertStored(*fitting, pixels, row_bytes);
     return;
   }
   turned_.resize(sizeof(Pixel) * static_cast<std::size_t>(width) * height);
   auto* stored = reinterpret_cast<Pixel*>(turned_.data());
   ConvertStored(*fitting, stored, static_cast<std::ptrdiff_t>(sizeof(Pixel)) * width);
-  Turn(stored, width, height, info_.rotation, pixels, row_bytes);
+  Turn(stored, width, height, info_.rotation, info_.mirrored, pixels, row_bytes);
 }
 
 template <class Pixel>

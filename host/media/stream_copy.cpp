@@ -118,6 +118,8 @@ void StreamCopy::CopyChapters() {
       static_cast<AVChapter**>(NotNull(av_calloc(input_->nb_chapters, sizeof(AVChapter*))));
   for (unsigned i = 0; i < input_->nb_chapters; ++i) {
     const AVChapter& from = *input_->chapters[i];
+    if (TimeOrNone(from.start) == AV_NOPTS_VALUE || TimeOrNone(from.end) == AV_NOPTS_VALUE)
+      continue;
     auto* to = static_cast<AVChapter*>(NotNull(av_mallocz(sizeof(AVChapter))));
     const std::int64_t shift = av_rescale_q(offset_, AV_TIME_BASE_Q, from.time_base);
     to->id = from.id;
@@ -141,6 +143,8 @@ PacketPtr StreamCopy::Next() {
     const AVRational from = input_->streams[packet->stream_index]->time_base;
     const AVRational to = output_.streams[found->second]->time_base;
     const std::int64_t shift = av_rescale_q(offset_, AV_TIME_BASE_Q, from);
+    packet->pts = TimeOrNone(packet->pts);
+    packet->dts = TimeOrNone(packet->dts);
     if (packet->pts != AV_NOPTS_VALUE) packet->pts -= shift;
     if (packet->dts == AV_NOPTS_VALUE) {
       packet->dts = packet->pts;
