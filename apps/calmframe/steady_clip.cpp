@@ -27,14 +27,15 @@ enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
 // A tracking window of the least size needs that much.
 constexpr int kLeastSide = 20;
 
-media::ClipInfo InfoOf(const std::string& path) {
-  const media::ClipInfo info = media::ClipReader::Open(path)->info();
+std::unique_ptr<media::ClipReader> OpenReader(const std::string& path) {
+  auto reader = media::ClipReader::Open(path);
+  const media::ClipInfo& info = reader->info();
   if (info.width < kLeastSide || info.height < kLeastSide) {
     throw media::Failure(media::Failure::Side::input, path + ": " + std::to_string(info.width) +
                                                           " by " + std::to_string(info.height) +
                                                           " pixels are too few to stabilize");
   }
-  return info;
+  return reader;
 }
 
 host::HostSettings SettingsFor(const media::ClipInfo& info, const ControlFlags& controls) {
@@ -83,22 +84,21 @@ std::string Reuse::Text() const {
 }
 
 SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls)
-    : SteadyClip(nullptr, path, controls) {}
+    : SteadyClip(nullptr, OpenReader(path), controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const std::string& path,
                        const ControlFlags& controls)
-    : SteadyClip(&project, path, controls) {}
+    : SteadyClip(&project, OpenReader(path), controls) {}
 
-SteadyClip::SteadyClip(const host::Project* project, const std::string& path,
+SteadyClip::SteadyClip(const host::Project* project, std::unique_ptr<media::ClipReader> reader,
                        const ControlFlags& controls) try
-    : path_(path),
-      info_(InfoOf(path)),
+    : info_(reader->info()),
       host_(PluginPath(), SettingsFor(info_, controls)),
       values_(ResolveControls(controls, host_.declarations())),
       session_(host_) {
-  const auto layer = boost::make_shared<host::Layer>(host::OpenClip(path));
+  const auto layer = boost::make_shared<host::Layer>(host::OpenClip(std::move(reader)));
   layer->Change([&](host::LayerState& state) {
-    state.name = state.file_name = path;
+    state.name = state.file_name = path();
     if (!project) return;
     state.start_frame = project->start_frame;
     state.length = project->length;
@@ -106,10 +106,10 @@ SteadyClip::SteadyClip(const host::Project* project, const std::string& path,
     state.field_type = project->field_type;
   });
   effect_ = project ? &session_.Load(layer, project->effect) : &session_.Apply(layer);
-  if (!effect_->creation().ok()) throw SolveFailure(effect_->creation().Line(path));
+  if (!effect_->creation().ok()) throw SolveFailure(effect_->creation().Line(path()));
   for (const auto& [disk_id, value] : values_) {
     const host::CommandResult result = effect_->SetParam(effect_->IndexOf(disk_id), value);
-    if (!result.ok()) throw SolveFailure(result.Line(path));
+    if (!result.ok()) throw SolveFailure(result.Line(path()));
   }
 } catch (const host::PluginError& error) {
   throw SolveFailure(error.what());
@@ -156,7 +156,7 @@ Reuse SteadyClip::Work(ProgressLine& progress) {
       button && (button->ui_flags & HX_PARAM_UI_DISABLED) == 0) {
     reuse = {};
     const host::CommandResult pressed = effect_->Press(analyze);
-    if (!pressed.ok()) throw SolveFailure(pressed.Line(path_));
+    if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
     Settle(progress, reuse);
   }
   reuse.solve = reuse.analysis && warp && warp == FirstWarp();
@@ -192,9 +192,9 @@ bool SteadyClip::SolveAnew(ProgressLine& progress) {
 host::Project SteadyClip::Saved() {
   host::Project project;
   const host::CommandResult saved = effect_->Save(&project.effect);
-  if (!saved.ok()) throw SolveFailure(saved.Line(path_));
+  if (!saved.ok()) throw SolveFailure(saved.Line(path()));
   const auto layer = effect_->shared()->layer()->state();
-  project.clip_path = path_;
+  project.clip_path = path();
   project.clip_content = layer->source->info().content;
   project.width = info_.width;
   project.height = info_.height;

@@ -35,7 +35,7 @@ class SteadyClip {
   SteadyClip(const std::string& path, const ControlFlags& controls);
   SteadyClip(const host::Project& project, const std::string& path, const ControlFlags& controls);
 
-  const std::string& path() const { return path_; }
+  const std::string& path() const { return info_.path; }
   const media::ClipInfo& info() const { return info_; }
   host::Host& host() { return host_; }
   bool has_new_controls() const { return !values_.empty(); }
@@ -61,7 +61,8 @@ class SteadyClip {
   void CheckMedia();
 
  private:
-  SteadyClip(const host::Project* project, const std::string& path, const ControlFlags& controls);
+  SteadyClip(const host::Project* project, std::unique_ptr<media::ClipReader> reader,
+             const ControlFlags& controls);
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`.
   void Settle(ProgressLine& progress, Reuse& reuse);
   // Throws SolveFailure where the effect is not ready.
@@ -69,7 +70,6 @@ class SteadyClip {
   // Address of the first frame's warp, which goes with its solve; null without one.
   const void* FirstWarp();
 
-  const std::string path_;
   const media::ClipInfo info_;
   host::Host host_;
   const std::map<std::int32_t, double> values_;

@@ -345,7 +345,11 @@ void FrameToPixels::Convert(const AVFrame& frame, Pixel* pixels, std::ptrdiff_t 
 
 template <class Pixel>
 FramePtr PixelsToFrame::Convert(const Pixel* pixels, std::ptrdiff_t row_bytes) {
-  FramePtr frame = NewPicture(format_, width_, height_);
+  // The last frame's memory serves again, unless the encoder still reads it.
+  if (!last_ || av_frame_is_writable(last_.get()) <= 0) {
+    last_ = NewPicture(format_, width_, height_);
+  }
+  FramePtr frame(NotNull(av_frame_clone(last_.get())));
   const AVPixFmtDescriptor& layout = LayoutOf(*frame);
   const bool alpha = (layout.flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
   const bool rgb = (layout.flags & AV_PIX_FMT_FLAG_RGB) != 0;

@@ -72,6 +72,7 @@ class PixelsToFrame {
   PlanarYuv planar_;
   Scaler scaler_;
   FramePtr planes_;
+  FramePtr last_;
 };
 
 }  // namespace calmframe::media

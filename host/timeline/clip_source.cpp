@@ -7,6 +7,7 @@
 #include <memory>
 #include <mutex>
 #include <numeric>
+#include <utility>
 #include <vector>
 
 #include "host/media/clip.h"
@@ -68,8 +69,8 @@ std::int32_t FieldTypeOf(media::FieldOrder order) {
 
 class ClipSource final : public Source {
  public:
-  explicit ClipSource(const std::string& path) : pool_(PicturePool::Make()) {
-    cursors_.push_back({media::ClipReader::Open(path)});
+  explicit ClipSource(std::unique_ptr<media::ClipReader> reader) : pool_(PicturePool::Make()) {
+    cursors_.push_back({std::move(reader)});
     const media::ClipInfo& clip = cursors_[0].reader->info();
     info_.width = clip.width;
     info_.height = clip.height;
@@ -78,7 +79,7 @@ class ClipSource final : public Source {
     info_.ticks_per_frame = TicksPerFrame(clip.frame_rate);
     info_.field_type = FieldTypeOf(clip.field_order);
     info_.bit_depth = clip.bit_depth;
-    info_.content = ContentOf(path);
+    info_.content = ContentOf(clip.path);
   }
 
   const SourceInfo& info() const override { return info_; }
@@ -181,7 +182,11 @@ Guid ContentOf(const std::string& path) {
 }
 
 SourcePtr OpenClip(const std::string& path) {
-  return boost::make_shared<ClipSource>(path);
+  return OpenClip(media::ClipReader::Open(path));
+}
+
+SourcePtr OpenClip(std::unique_ptr<media::ClipReader> reader) {
+  return boost::make_shared<ClipSource>(std::move(reader));
 }
 
 }  // namespace calmframe::host

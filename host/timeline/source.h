@@ -3,8 +3,10 @@
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <string>
 
+#include "host/media/clip.h"
 #include "host/timeline/picture.h"
 #include "platform/hx/hx_types.h"
 #include "platform/tessel/guid.h"
@@ -45,6 +47,8 @@ tessel::utility::Guid ContentOf(const std::string& path);
 
 // A video file. Throws media::Failure (a std::runtime_error, one line) if it can't be read.
 SourcePtr OpenClip(const std::string& path);
+// The same of a clip that is open: its frames have been found, which costs decoding all of it.
+SourcePtr OpenClip(std::unique_ptr<media::ClipReader> reader);
 
 // Frames that are drawn when asked for, at once from several threads. info.content tells what is
 // drawn.

@@ -115,17 +115,17 @@ std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>& pass, std::size_t M
 
 template <class Pixel>
 void drawMesh(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>& output,
-              const TileMap* only) {
-  const StripRenderer<Pixel> strips(mesh, source, output, only);
+              const TileMap* only, bool clears) {
+  const StripRenderer<Pixel> strips(mesh, source, output, only, clears);
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors([&strips](std::size_t band) { strips(band); },
                                                       strips.bands());
 }
 
 template <class Pixel>
-bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output) {
+bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output, bool clears) {
   const std::optional<FrameMesh> mesh = meshOfFrame(pass, M, output.width(), output.height());
   if (!mesh) return false;
-  drawMesh(*mesh, *pass.sources.Fetch(M), output);
+  drawMesh(*mesh, *pass.sources.Fetch(M), output, nullptr, clears);
   return true;
 }
 
@@ -134,7 +134,6 @@ bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettin
                  Renderer& renderer, std::size_t frame, SourceFrames<Pixel>& sources,
                  WorldOperations<Pixel>& operations, WorldX<Pixel>& output) {
   if (frame >= warps.frameCount()) return false;
-  output.clear();
   const double zoom = GetZoom(warps, crop, settings, renderer);
   const bool synthesizes = settings.framing == Framing::synthesize_edges;
   PreparedSources<Pixel> prepared(sources, scaledEdges(settings.edges, renderer.scaleX), frame);
@@ -148,18 +147,20 @@ bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettin
                               frame,
                               scaled_crop(crop, crops(settings.framing), frame, renderer),
                               zoom};
-  drawFrame(pass, frame, output);
+  // Each band is cleared right before it is drawn, while it goes to the cache anyway.
+  drawFrame(pass, frame, output, true);
   deblurFrame(pass, output);
   if (synthesizes) synthesizeEdges(pass, output);
   return true;
 }
 
-#define CALMFRAME_INSTANTIATE(Pixel)                                                              \
-  template std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>&, std::size_t, int, int);  \
-  template void drawMesh(const FrameMesh&, const WorldX<Pixel>&, WorldX<Pixel>&, const TileMap*); \
-  template bool drawFrame(const FramePass<Pixel>&, std::size_t, WorldX<Pixel>&);                  \
-  template bool renderFrame(const ClipWarps&, const cropper*, const RenderSettings&, Renderer&,   \
-                            std::size_t, SourceFrames<Pixel>&, WorldOperations<Pixel>&,           \
+#define CALMFRAME_INSTANTIATE(Pixel)                                                             \
+  template std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>&, std::size_t, int, int); \
+  template void drawMesh(const FrameMesh&, const WorldX<Pixel>&, WorldX<Pixel>&, const TileMap*, \
+                         bool);                                                                  \
+  template bool drawFrame(const FramePass<Pixel>&, std::size_t, WorldX<Pixel>&, bool);           \
+  template bool renderFrame(const ClipWarps&, const cropper*, const RenderSettings&, Renderer&,  \
+                            std::size_t, SourceFrames<Pixel>&, WorldOperations<Pixel>&,          \
                             WorldX<Pixel>&);
 CALMFRAME_INSTANTIATE(HX_Pixel8)
 CALMFRAME_INSTANTIATE(HX_Pixel16)

@@ -122,16 +122,18 @@ template <class Pixel>
 std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>& pass, std::size_t M, int width,
                                      int height);
 
-// Draws a frame through its mesh over what `output` holds; with `only`, at least what lies in those
-// tiles. The strips run on all processors; their number never shows in the result.
+// Draws a frame through its mesh over what `output` holds or, with `clears`, over transparent
+// black; with `only`, at least what lies in those tiles. The strips run on all processors; their
+// number never shows in the result.
 template <class Pixel>
 void drawMesh(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>& output,
-              const TileMap* only = nullptr);
+              const TileMap* only = nullptr, bool clears = false);
 
-// Draws source frame M over what `output` holds. False, with nothing fetched, where no motion is
-// known.
+// Draws source frame M over what `output` holds or, with `clears`, over transparent black. False,
+// with nothing fetched, where no motion is known.
 template <class Pixel>
-bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output);
+bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output,
+               bool clears = false);
 
 // Clears the output and draws the stabilized frame, deblurred where settings say so. `crop` may be
 // null. False, with nothing done,

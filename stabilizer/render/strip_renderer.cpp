@@ -122,18 +122,24 @@ source_plane plane(const WorldX<Pixel>& source, double max_x, double max_y) {
 
 template <class Pixel>
 StripRenderer<Pixel>::StripRenderer(const FrameMesh& mesh, const WorldX<Pixel>& source,
-                                    WorldX<Pixel>& destination, const TileMap* only)
+                                    WorldX<Pixel>& destination, const TileMap* only, bool clears)
     : FrameMesh(mesh),
       destination_(destination),
       only_(only),
+      clears_(clears),
       widened_(widened(source)),
       source_(plane(widened_ ? *widened_ : source,
                     std::min(renderer_.sourceWidth, source.width()) - 1.0001,
                     std::min(renderer_.sourceHeight, source.height()) - 1.0001)),
       band_height_(only ? TileMap::side : band_rows),
       tolerance2_(std::max(4.0, 4.0 / (zoom_ * zoom_))) {
-  for (int x = 0; x < destination.width(); ++x) {
-    test_x_.push_back(static_cast<double>(x - to_destination_x_) / zoom_);
+  const auto columns = static_cast<std::size_t>(std::max(destination.width(), 0));
+  test_x_.reserve(columns);
+  plane_x_.reserve(columns);
+  for (int i = 0; i < destination.width(); ++i) {
+    const auto x = static_cast<double>(i - to_destination_x_);
+    test_x_.push_back(x / zoom_);
+    plane_x_.push_back((x + offset_x_) / zoom_);
   }
 }
 
@@ -146,6 +152,7 @@ template <class Pixel>
 void StripRenderer<Pixel>::operator()(std::size_t band) const {
   const std::int64_t first = static_cast<std::int64_t>(band) * band_height_;
   const std::int64_t end = std::min<std::int64_t>(first + band_height_, destination_.height());
+  if (clears_) destination_.clear(static_cast<int>(first), static_cast<int>(end));
   // A zoom of 0 shows nothing.
   if (!(zoom_ > 0) || source_.width < 1 || source_.height < 1) return;
   if (only_ && !only_->touches(0, first, destination_.width(), end)) return;
@@ -277,15 +284,14 @@ void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, row_runs& runs
   drawSpan(q, begin, q.x1, py, row, runs);
 }
 
-// Plane positions of the row's pixels are ((x + offset) / zoom, py).
 template <class Pixel>
 void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py,
                                     Pixel* row, row_runs& runs) const {
-  const auto plane_x = [&](std::int64_t x) { return (static_cast<double>(x) + offset_x_) / zoom_; };
-  while (x0 < x1 && !(plane_x(x1 - 1) < renderer_.planeWidth)) --x1;
+  const double* plane_x = plane_x_.data() + to_destination_x_;
+  while (x0 < x1 && !(plane_x[x1 - 1] < renderer_.planeWidth)) --x1;
   const matrix3& h = q.square_from_plane;
   for (std::int64_t x = x0; x < x1; x += max_run) {
-    const double px = plane_x(x);
+    const double px = plane_x[x];
     const double inverse_w = 1.0 / (h[6] * px + h[7] * py + h[8]);
     const double u = (h[0] * px + h[1] * py + h[2]) * inverse_w;
     const double v = (h[3] * px + h[4] * py + h[5]) * inverse_w;

@@ -18,9 +18,10 @@ template <class Pixel>
 class StripRenderer : FrameMesh {
  public:
   // mesh: for a destination of that size. With `only`, tiles of the destination, their pixels are
-  // drawn as ever, and of the others some or none. All referents must outlive this.
+  // drawn as ever, and of the others some or none. With `clears`, a band is made transparent black
+  // first. All referents must outlive this.
   StripRenderer(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>& destination,
-                const TileMap* only = nullptr);
+                const TileMap* only = nullptr, bool clears = false);
 
   // How many bands the destination has; a band may be drawn on any thread.
   std::size_t bands() const;
@@ -39,11 +40,13 @@ class StripRenderer : FrameMesh {
 
   WorldX<Pixel>& destination_;
   const TileMap* only_;
+  bool clears_;
   std::unique_ptr<WorldX<Pixel>> widened_;  // a source of one column or row, that twice
   source_plane source_;
   std::int64_t band_height_;
   double tolerance2_;
-  std::vector<double> test_x_;  // of each destination column, in the plane
+  // Of each destination column, in the plane: where edges are tested and where it is looked up.
+  std::vector<double> test_x_, plane_x_;
 };
 
 extern template class StripRenderer<HX_Pixel8>;

@@ -72,13 +72,18 @@ class WorldX {
   const_view_type view() const { return const_cast<WorldX*>(this)->view(); }
 
   // Transparent black; padding is left alone.
-  void clear() {
+  void clear() { clear(0, height_); }
+  // Of rows [first, end) alone.
+  void clear(int first, int end) {
     const std::size_t bytes = sizeof(Pixel) * static_cast<std::size_t>(width_);
     if (row_bytes_ == static_cast<std::ptrdiff_t>(bytes)) {
-      if (bytes != 0) std::memset(static_cast<void*>(data_), 0, bytes * height_);
+      if (bytes != 0 && first < end) {
+        std::memset(static_cast<void*>(row(first)), 0,
+                    bytes * static_cast<std::size_t>(end - first));
+      }
       return;
     }
-    for (int y = 0; y < height_; ++y) std::memset(static_cast<void*>(row(y)), 0, bytes);
+    for (int y = first; y < end; ++y) std::memset(static_cast<void*>(row(y)), 0, bytes);
   }
 
  private:
