@@ -2,7 +2,6 @@
 #include <memory>
 #include <new>
 #include <random>
-#include <regex>
 #include <set>
 #include <string>
 #include <system_error>
@@ -31,14 +30,16 @@ class TourMemory : public PlayedPlugin {
   // What a command may answer without memory: a code of its own with what the user is told, or what
   // the host's own operation answered.
   static void ExpectClear(const CommandResult& result) {
-    static const std::regex kTold(
-        "Calmframe out of memory on frame \\d+\\.|unknown exception on frame \\d+ in Calmframe\\."
-        "|Not enough memory to allocate stabilizer data\\.|Not able to acquire OVK Suite\\.|");
+    static const std::set<std::string> kTold = {
+        "", "Calmframe out of memory on frame .", "unknown exception on frame  in Calmframe.",
+        "Not enough memory to allocate stabilizer data.", "Not able to acquire OVK Suite."};
     static const std::set<HX_Err> kCodes = {HX_ERR_NONE,          HX_ERR_UNKNOWN,
                                             HX_ERR_MEMORY,        HX_ERR_HANDLE_LOCK,
                                             HX_ERR_MISSING_SUITE, HX_ERR_NO_INSTANCE};
     EXPECT_TRUE(kCodes.count(result.code)) << result.code;
-    EXPECT_TRUE(std::regex_match(result.message, kTold)) << result.message;
+    std::string told = result.message;
+    std::erase_if(told, [](char c) { return c >= '0' && c <= '9'; });
+    EXPECT_TRUE(kTold.count(told)) << result.message;
   }
 
   // Whatever is asked of a host may be more than its memory.
