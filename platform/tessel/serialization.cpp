@@ -42,6 +42,17 @@ void Write(const Value& value, std::string& text) {
   std::visit(write, value.content());
 }
 
+Value::Content ContentOf(std::initializer_list<Value> values) {
+  Value::Members members;
+  for (const Value& value : values) {
+    const auto* const pair = value.as<Value::Array>();
+    const auto* const key = pair && pair->size() == 2 ? (*pair)[0].as<std::string>() : nullptr;
+    if (!key) return Value::Array(values);
+    members.emplace_back(*key, (*pair)[1]);
+  }
+  return members;
+}
+
 // Builds a value of what the library's parser meets.
 class Builder final : public nlohmann::json_sax<Leaf> {
  public:
@@ -97,21 +108,7 @@ class Builder final : public nlohmann::json_sax<Leaf> {
 
 }  // namespace
 
-Value::Value(std::initializer_list<Value> values) {
-  const bool is_object = std::all_of(values.begin(), values.end(), [](const Value& value) {
-    const Array* const pair = value.as<Array>();
-    return pair && pair->size() == 2 && (*pair)[0].as<std::string>();
-  });
-  if (!is_object) {
-    content_ = Array(values);
-    return;
-  }
-  content_ = Members();
-  for (const Value& value : values) {
-    const Array& pair = *value.as<Array>();
-    (*this)[*pair[0].as<std::string>()] = pair[1];
-  }
-}
+Value::Value(std::initializer_list<Value> values) : content_(ContentOf(values)) {}
 
 const Value* Value::find(const std::string& key) const {
   const Members* const members = as<Members>();

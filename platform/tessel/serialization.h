@@ -17,7 +17,11 @@ namespace tessel::serialization {
 // A value of its own: those of the JSON library need memory to be destroyed.
 class Value {
  public:
-  using Array = std::vector<Value>;
+  // A type of its own: where all of a variant's are known to move without failing, libstdc++ 12
+  // takes it for whole even after a copy that failed.
+  struct Array : std::vector<Value> {
+    using std::vector<Value>::vector;
+  };
   using Members = std::vector<std::pair<std::string, Value>>;  // keys are unique
   // Integers from 0 on are the unsigned ones.
   using Content = std::variant<std::nullptr_t, bool, std::int64_t, std::uint64_t, double,
