@@ -46,6 +46,15 @@ T* NotNull(T* pointer) {
 inline FramePtr NewFrame() {
   return FramePtr(NotNull(av_frame_alloc()));
 }
+// With memory of its own, every row aligned to 64 bytes for any vectors.
+inline FramePtr NewPicture(int format, int width, int height) {
+  FramePtr frame = NewFrame();
+  frame->format = format;
+  frame->width = width;
+  frame->height = height;
+  if (av_frame_get_buffer(frame.get(), 64) < 0) throw std::bad_alloc();
+  return frame;
+}
 inline PacketPtr NewPacket() {
   return PacketPtr(NotNull(av_packet_alloc()));
 }

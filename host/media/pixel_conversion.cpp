@@ -49,39 +49,11 @@ const AVPixFmtDescriptor& LayoutOf(const AVFrame& frame) {
   return *NotNull(av_pix_fmt_desc_get(static_cast<AVPixelFormat>(frame.format)));
 }
 
-bool IsYuv(const AVPixFmtDescriptor& layout) {
-  return layout.nb_components >= 3 &&
-         !(layout.flags & (AV_PIX_FMT_FLAG_RGB | AV_PIX_FMT_FLAG_PAL | AV_PIX_FMT_FLAG_FLOAT |
-                           AV_PIX_FMT_FLAG_BAYER)) &&
-         std::strncmp(layout.name, "xyz", 3) != 0;
-}
-
-FramePtr NewPicture(int format, int width, int height) {
-  FramePtr frame = NewFrame();
-  frame->format = format;
-  frame->width = width;
-  frame->height = height;
-  if (av_frame_get_buffer(frame.get(), 0) < 0) throw std::bad_alloc();
-  return frame;
-}
-
 AVFrame& Reuse(FramePtr& frame, int format, int width, int height) {
   if (!frame || frame->format != format || frame->width != width || frame->height != height) {
     frame = NewPicture(format, width, height);
   }
   return *frame;
-}
-
-// Every second row of a frame, sharing its memory.
-FramePtr FieldOf(const AVFrame& frame, int parity) {
-  FramePtr field = NewFrame();
-  if (av_frame_ref(field.get(), &frame) < 0) throw std::bad_alloc();
-  field->height /= 2;
-  for (int plane = 0; plane < 4 && field->data[plane]; ++plane) {
-    field->data[plane] += std::ptrdiff_t{parity} * field->linesize[plane];
-    field->linesize[plane] *= 2;
-  }
-  return field;
 }
 
 template <class Pixel>
@@ -225,39 +197,10 @@ void Turn(const Pixel* stored, int width, int height, int rotation, Pixel* pixel
 
 }  // namespace
 
-ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int height) {
-  ColourModel model;
-  model.matrix = static_cast<AVColorSpace>(tags.matrix);
-  switch (model.matrix) {
-    case AVCOL_SPC_BT709:
-    case AVCOL_SPC_FCC:
-    case AVCOL_SPC_BT470BG:
-    case AVCOL_SPC_SMPTE170M:
-    case AVCOL_SPC_SMPTE240M:
-    case AVCOL_SPC_BT2020_NCL:
-      break;
-    case AVCOL_SPC_BT2020_CL:
-    case AVCOL_SPC_ICTCP:
-      model.matrix = AVCOL_SPC_BT2020_NCL;
-      break;
-    default:
-      model.matrix = width >= 1280 || height >= 720 ? AVCOL_SPC_BT709 : AVCOL_SPC_SMPTE170M;
-  }
-  const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(format);
-  const bool jpeg = layout && std::strncmp(layout->name, "yuvj", 4) == 0;
-  const bool grey = layout && layout->nb_components < 3;
-  model.full_range =
-      jpeg || tags.range == AVCOL_RANGE_JPEG || (grey && tags.range == AVCOL_RANGE_UNSPECIFIED);
-  model.chroma = static_cast<AVChromaLocation>(tags.chroma_location);
-  if (model.chroma == AVCHROMA_LOC_UNSPECIFIED) {
-    model.chroma = jpeg ? AVCHROMA_LOC_CENTER : AVCHROMA_LOC_LEFT;
-  }
-  return model;
-}
-
 void Scaler::Scale(const AVFrame& from, AVFrame& to, const ColourModel& model) {
-  const bool subsampled = LayoutOf(from).log2_chroma_h == 1 || LayoutOf(to).log2_chroma_h == 1;
-  if (!model.fields || !subsampled || from.height != to.height || from.height % 4 != 0) {
+  const bool by_fields =
+      ByFields(model, LayoutOf(from), from.height) || ByFields(model, LayoutOf(to), to.height);
+  if (!by_fields || from.height != to.height) {
     ScalePart(from, to, model, 0);
     return;
   }
@@ -341,7 +284,13 @@ void FrameToPixels::ConvertStored(const AVFrame& frame, Pixel* pixels, std::ptrd
     } else {
       FromComponents(frame, model.full_range, pixels, row_bytes);
     }
-  } else if constexpr (std::is_same_v<Pixel, HX_Pixel8>) {
+    return;
+  }
+  if constexpr (std::is_same_v<Pixel, HX_Pixel8>) {
+    if (PlanarYuv::Takes(static_cast<AVPixelFormat>(frame.format), frame.width, frame.height)) {
+      planar_.ToPixels(frame, model, pixels, row_bytes);
+      return;
+    }
     AVFrame& planes =
         Reuse(planes_, alpha ? AV_PIX_FMT_GBRAP : AV_PIX_FMT_GBRP, frame.width, frame.height);
     scaler_.Scale(frame, planes, model);
@@ -407,6 +356,12 @@ FramePtr PixelsToFrame::Convert(const Pixel* pixels, std::ptrdiff_t row_bytes) {
       }
     }
     return frame;
+  }
+  if constexpr (std::is_same_v<Pixel, HX_Pixel8>) {
+    if (PlanarYuv::Takes(format_, width_, height_)) {
+      planar_.FromPixels(pixels, row_bytes, model_, *frame);
+      return frame;
+    }
   }
   if (std::is_same_v<Pixel, HX_Pixel8> || rgb) {
     AVFrame& argb = Reuse(planes_, AV_PIX_FMT_ARGB, width_, height_);

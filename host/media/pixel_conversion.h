@@ -4,24 +4,16 @@
 #include <cstdint>
 #include <vector>
 
+#include "host/media/colour_model.h"
 #include "host/media/ffmpeg.h"
+#include "host/media/planar_yuv.h"
 #include "platform/hx/hx_pixel.h"
 
-// Between a file's frames and the host's pixels. swscale brings chroma to full size and back (each
-// field by itself in an interlaced 4:2:0 frame, at the tagged chroma position); for 16 bits and
-// floats the colour matrix is computed here, since swscale's falls short of full white by 0.4 %.
+// Between a file's frames and the host's pixels. Planar YUV goes to and from 8 bits by PlanarYuv;
+// for all else swscale brings chroma to full size and back (each field by itself in an interlaced
+// 4:2:0 frame, at the tagged chroma position). For 16 bits and floats the colour matrix is computed
+// here, since swscale's falls short of full white by 0.4 %.
 namespace calmframe::media {
-
-// How a frame's numbers mean colours: the tags, and where they are silent what players assume.
-struct ColourModel {
-  AVColorSpace matrix = AVCOL_SPC_BT709;
-  bool full_range = false;
-  AVChromaLocation chroma = AVCHROMA_LOC_LEFT;
-  bool fields = false;  // 4:2:0 chroma belongs to each field
-};
-
-// width, height: of the clip; BT.709 from 720 lines or 1280 columns on, BT.601 below.
-ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int height);
 
 // A swscale context that is made again when its frames change.
 class Scaler {
@@ -55,6 +47,7 @@ class FrameToPixels {
   void ConvertStored(const AVFrame& frame, Pixel* pixels, std::ptrdiff_t row_bytes);
 
   const ClipInfo& info_;
+  PlanarYuv planar_;
   Scaler scaler_;
   Scaler resizer_;
   FramePtr resized_;
@@ -76,6 +69,7 @@ class PixelsToFrame {
   const int width_;
   const int height_;
   const ColourModel model_;
+  PlanarYuv planar_;
   Scaler scaler_;
   FramePtr planes_;
 };

@@ -1,0 +1,59 @@
+#include "host/media/colour_model.h"
+
+#include <cstring>
+
+namespace calmframe::media {
+
+ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int height) {
+  ColourModel model;
+  model.matrix = static_cast<AVColorSpace>(tags.matrix);
+  switch (model.matrix) {
+    case AVCOL_SPC_BT709:
+    case AVCOL_SPC_FCC:
+    case AVCOL_SPC_BT470BG:
+    case AVCOL_SPC_SMPTE170M:
+    case AVCOL_SPC_SMPTE240M:
+    case AVCOL_SPC_BT2020_NCL:
+      break;
+    case AVCOL_SPC_BT2020_CL:
+    case AVCOL_SPC_ICTCP:
+      model.matrix = AVCOL_SPC_BT2020_NCL;
+      break;
+    default:
+      model.matrix = width >= 1280 || height >= 720 ? AVCOL_SPC_BT709 : AVCOL_SPC_SMPTE170M;
+  }
+  const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(format);
+  const bool jpeg = layout && std::strncmp(layout->name, "yuvj", 4) == 0;
+  const bool grey = layout && layout->nb_components < 3;
+  model.full_range =
+      jpeg || tags.range == AVCOL_RANGE_JPEG || (grey && tags.range == AVCOL_RANGE_UNSPECIFIED);
+  model.chroma = static_cast<AVChromaLocation>(tags.chroma_location);
+  if (model.chroma == AVCHROMA_LOC_UNSPECIFIED) {
+    model.chroma = jpeg ? AVCHROMA_LOC_CENTER : AVCHROMA_LOC_LEFT;
+  }
+  return model;
+}
+
+bool IsYuv(const AVPixFmtDescriptor& layout) {
+  return layout.nb_components >= 3 &&
+         !(layout.flags & (AV_PIX_FMT_FLAG_RGB | AV_PIX_FMT_FLAG_PAL | AV_PIX_FMT_FLAG_FLOAT |
+                           AV_PIX_FMT_FLAG_BAYER)) &&
+         std::strncmp(layout.name, "xyz", 3) != 0;
+}
+
+bool ByFields(const ColourModel& model, const AVPixFmtDescriptor& layout, int height) {
+  return model.fields && layout.log2_chroma_h == 1 && height % 4 == 0;
+}
+
+FramePtr FieldOf(const AVFrame& frame, int parity) {
+  FramePtr field = NewFrame();
+  if (av_frame_ref(field.get(), &frame) < 0) throw std::bad_alloc();
+  field->height /= 2;
+  for (int plane = 0; plane < 4 && field->data[plane]; ++plane) {
+    field->data[plane] += std::ptrdiff_t{parity} * field->linesize[plane];
+    field->linesize[plane] *= 2;
+  }
+  return field;
+}
+
+}  // namespace calmframe::media
