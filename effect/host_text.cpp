@@ -1,6 +1,8 @@
 #include "effect/host_text.h"
 
 #include <algorithm>
+#include <memory>
+#include <type_traits>
 #include <vector>
 
 #include "effect/effect_globals.h"
@@ -66,12 +68,11 @@ std::u16string UnitsToText(const std::uint16_t (&units)[kHostUnits]) {
 }
 
 std::string TakeText(const HX_StringSuite1& strings, HX_String string) {
+  const auto dispose = [&strings](HX_String held) { strings.Dispose(held); };
+  const std::unique_ptr<std::remove_pointer_t<HX_String>, decltype(dispose)> own(string, dispose);
   const char* bytes = nullptr;
-  const HX_Err code = strings.GetUTF8(string, &bytes);
-  const std::string text = code == HX_ERR_NONE && bytes != nullptr ? bytes : "";
-  strings.Dispose(string);
-  ThrowIfFailed(code);
-  return text;
+  ThrowIfFailed(strings.GetUTF8(string, &bytes));
+  return bytes != nullptr ? bytes : "";
 }
 
 const char* GetString(const HostContext& context, std::int32_t index) {

@@ -49,10 +49,13 @@ void AnalysisEffect::UpdateStartStopButtonEnablement(bool analyze_enabled, bool 
   mix.AddValue(static_cast<std::uint8_t>(cancel_enabled));
   mix.AddValue(static_cast<std::uint8_t>(analyze_enabled));
   AnalysisState* const state = GetState();
-  if (state != nullptr && state->button_identity == mix.Finish()) return;
+  const tessel::utility::Guid identity = mix.Finish();
+  if (state != nullptr && state->button_identity == identity) return;
+  // What is told in part would pass for what was told before.
+  if (state != nullptr) state->button_identity = {};
   UpdateButton(kCancelParam, cancel_enabled, label.c_str());
   UpdateButton(kAnalyzeParam, analyze_enabled, nullptr);
-  if (state != nullptr) state->button_identity = mix.Finish();
+  if (state != nullptr) state->button_identity = identity;
 }
 
 bool AnalysisEffect::IsAnalysisCurrent(AnalysisState* state) {

@@ -40,16 +40,12 @@ bool OutstandingRequests::Await(const Guid& frame) {
   return identifiers_.count(frame) != 0;
 }
 
-std::vector<std::int32_t> OutstandingRequests::TakeAll() {
+std::map<std::int32_t, Guid> OutstandingRequests::TakeAll() noexcept {
   std::map<std::int32_t, Guid> taken;
-  {
-    const Lock lock(lock_);
-    taken.swap(by_request_);
-    identifiers_.clear();
-  }
-  std::vector<std::int32_t> ids;
-  for (const auto& [id, frame] : taken) ids.push_back(id);
-  return ids;
+  const Lock lock(lock_);
+  taken.swap(by_request_);
+  identifiers_.clear();
+  return taken;
 }
 
 void FinishFrameRequest(HX_Frame frame, void* record) noexcept {

@@ -5,7 +5,6 @@
 #include <map>
 #include <mutex>
 #include <set>
-#include <vector>
 
 #include "platform/hx/hx_suites.h"
 #include "platform/tessel/guid.h"
@@ -49,8 +48,8 @@ class OutstandingRequests {
   // a wait.
   bool Await(const tessel::utility::Guid& frame);
   void Wait() { frame_arrived_.Wait(); }
-  // Empties the table; the ids of what it held, to be cancelled.
-  std::vector<std::int32_t> TakeAll();
+  // Empties the table; what it held, by the ids to be cancelled.
+  std::map<std::int32_t, tessel::utility::Guid> TakeAll() noexcept;
 
  private:
   mutable std::recursive_mutex lock_;

@@ -134,7 +134,7 @@ void VideoSegmentRenderSuiteJob::ReleaseNode() {
 }
 
 void VideoSegmentRenderSuiteJob::CancelRequests() {
-  for (const std::int32_t id : requests_->TakeAll()) render_->Cancel(id);
+  for (const auto& [id, frame] : requests_->TakeAll()) render_->Cancel(id);
   for (const auto& [frame, count] : references_) {
     const HX_Guid identifier = ToHost(frame);
     for (int i = 0; i < count; ++i) cache_->Dereference(&identifier);

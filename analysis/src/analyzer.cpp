@@ -1,6 +1,7 @@
 #include "analysis/src/analyzer.h"
 
 #include <boost/make_shared.hpp>
+#include <new>
 #include <utility>
 
 #include "analysis/src/identities.h"
@@ -125,6 +126,7 @@ void AnalyzerPrem::Start(HX_InData* host_in, HX_OutData* host_out) {
   LogFields("selector", record_.selector_params);
   LogFields("tracker", record_.tracker_params);
   source_identity_ = GetUpstreamIdentifier(host_in, host_out);
+  bool is_new = false;
   const JobRegistry::Entry entry = JobRegistry::Instance().FindOrMake(
       key(),
       [this](const JobRegistry::Entry& found) { return MayJoin(found, record_.tracker_guid); },
@@ -133,12 +135,18 @@ void AnalyzerPrem::Start(HX_InData* host_in, HX_OutData* host_out) {
         made.analysis =
             boost::make_shared<Analysis>(record_.selector_params, record_.tracker_params);
         made.job = make_job_(host_in, host_out, record_.job_input_parameters, made.analysis);
+        is_new = true;
         return made;
       });
   job_ = entry.job;
   bound_ = true;
   record_.tracker_guid = entry.analysis->tracker_identity();
-  entry.job->Start(entry.job);
+  try {
+    entry.job->Start(entry.job);
+  } catch (...) {  // others would join it and wait for ever
+    if (is_new) JobRegistry::Instance().Remove(key(), entry.job->id());
+    throw;
+  }
   Analyzer::Start(host_in, host_out);
 }
 
@@ -149,10 +157,15 @@ void AnalyzerPrem::Stop(HX_InData* host_in, HX_OutData* host_out) {
     const auto remove = [key = key(), job_id = entry.job->id()] {
       JobRegistry::Instance().Remove(key, job_id);
     };
-    if (record_.job_stage != JobStage::SeenEnded ||
-        !entry.job->executor().Post(remove, kLingerMs)) {
-      remove();
-    }
+    const auto lingers = [&] {
+      try {
+        return record_.job_stage == JobStage::SeenEnded &&
+               entry.job->executor().Post(remove, kLingerMs);
+      } catch (const std::bad_alloc&) {
+        return false;
+      }
+    };
+    if (!lingers()) remove();
   }
   job_.reset();
   bound_ = false;

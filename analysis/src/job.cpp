@@ -34,7 +34,7 @@ JobStatus Job::GetStatus() const {
 
 std::string Job::GetErrorText() const {
   const Lock lock(status_lock_);
-  return error_text_;
+  return error_literal_;
 }
 
 bool Job::WasCancelled() const {
@@ -83,7 +83,7 @@ void Job::Cancel() {
 void Job::SetFailed(const char* literal) {
   ChangeStatus([&] {
     if (status_.state >= JobState::Failed) return false;
-    error_text_ = literal;
+    error_literal_ = literal;
     Enter(JobState::Failed);
     return true;
   });

@@ -91,10 +91,10 @@ class Job {
   const tessel::utility::Guid id_;
   const JobInput input_;
   mutable std::recursive_mutex status_lock_;
-  JobStatus status_;            // guarded by status_lock_
-  std::string error_text_;      // guarded by status_lock_
-  bool was_cancelled_ = false;  // guarded by status_lock_
-  std::int64_t end_tick_ = -1;  // guarded by status_lock_
+  JobStatus status_;                // guarded by status_lock_
+  const char* error_literal_ = "";  // guarded by status_lock_; needs no memory
+  bool was_cancelled_ = false;      // guarded by status_lock_
+  std::int64_t end_tick_ = -1;      // guarded by status_lock_
   std::recursive_mutex run_list_lock_;
   std::vector<boost::shared_ptr<RunFunction>> run_list_;  // guarded by run_list_lock_
   std::recursive_mutex listener_lock_;

@@ -20,13 +20,16 @@ JobRegistry::Entry JobRegistry::Find(const Key& key) const {
 JobRegistry::Entry JobRegistry::FindOrMake(const Key& key,
                                            const boost::function<bool(const Entry&)>& may_join,
                                            const boost::function<Entry()>& make) {
-  Entry replaced;  // a job's end asks the host; it comes after the lock
+  Entry made, replaced;  // a job's end asks the host; it comes after the lock
   const Lock lock(lock_);
   const auto found = entries_.find(key);
   if (found != entries_.end() && may_join(found->second)) return found->second;
-  const Entry made = make();
-  Entry& place = entries_[key];
-  replaced = std::exchange(place, made);
+  made = make();
+  if (found != entries_.end()) {
+    replaced = std::exchange(found->second, made);
+  } else {
+    entries_.emplace(key, made);
+  }
   return made;
 }
 

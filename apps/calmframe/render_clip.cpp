@@ -65,16 +65,15 @@ class RenderAhead {
         window_(settings.threads + 2),
         next_(static_cast<std::int64_t>(range.first)),
         taken_(next_) {
-    for (int i = 0; i < settings.threads; ++i) threads_.emplace_back([this] { RenderFrames(); });
-  }
-  ~RenderAhead() {
-    {
-      const std::lock_guard lock(mutex_);
-      stopped_ = true;
+    try {
+      threads_.reserve(static_cast<std::size_t>(settings.threads));
+      for (int i = 0; i < settings.threads; ++i) threads_.emplace_back([this] { RenderFrames(); });
+    } catch (...) {
+      Stop();
+      throw;
     }
-    changed_.notify_all();
-    for (std::thread& thread : threads_) thread.join();
   }
+  ~RenderAhead() { Stop(); }
   RenderAhead(const RenderAhead&) = delete;
   RenderAhead& operator=(const RenderAhead&) = delete;
 
@@ -91,6 +90,15 @@ class RenderAhead {
   }
 
  private:
+  void Stop() {
+    {
+      const std::lock_guard lock(mutex_);
+      stopped_ = true;
+    }
+    changed_.notify_all();
+    for (std::thread& thread : threads_) thread.join();
+  }
+
   void RenderFrames() {
     try {
       const std::unique_ptr<host::Renderer> renderer = clip_.effect().MakeRenderer();

@@ -1,6 +1,6 @@
 #include "host/base/operations.h"
 
-#include <algorithm>
+#include <new>
 
 namespace calmframe::host {
 namespace {
@@ -65,30 +65,38 @@ Ledger& Ledger::Get() {
   return ledger;
 }
 
-void Ledger::Take(const std::string& kind, std::int64_t count) {
+void Ledger::Take(std::string_view suite) {
   std::lock_guard lock(mutex_);
-  held_[kind] += count;
+  auto place = held_.find(suite);
+  if (place == held_.end()) place = held_.emplace(suite, 0).first;
+  ++place->second;
 }
 
-void Ledger::GiveBack(const std::string& kind, std::int64_t count) {
-  std::lock_guard lock(mutex_);
-  std::int64_t& held = held_[kind];
-  if (held < count && mistakes_.size() < kMistakes) {
-    mistakes_.push_back(kind + ": given back but not held");
+void Ledger::GiveBack(std::string_view suite) noexcept {
+  {
+    std::lock_guard lock(mutex_);
+    const auto place = held_.find(suite);
+    if (place != held_.end() && place->second > 0) {
+      --place->second;
+      return;
+    }
   }
-  held = std::max<std::int64_t>(held - count, 0);
+  Mistake(suite, ": given back but not held");
 }
 
-void Ledger::Mistake(const std::string& what) {
-  std::lock_guard lock(mutex_);
-  if (mistakes_.size() < kMistakes) mistakes_.push_back(what);
+void Ledger::Mistake(std::string_view where, std::string_view what) noexcept {
+  try {
+    std::lock_guard lock(mutex_);
+    if (mistakes_.size() < kMistakes) mistakes_.push_back(std::string(where).append(what));
+  } catch (const std::bad_alloc&) {
+  }
 }
 
 std::map<std::string, std::int64_t> Ledger::held() const {
   std::lock_guard lock(mutex_);
   std::map<std::string, std::int64_t> held;
-  for (const auto& [kind, count] : held_) {
-    if (count > 0) held.emplace(kind, count);
+  for (const auto& [suite, count] : held_) {
+    if (count > 0) held.emplace(suite, count);
   }
   return held;
 }
@@ -100,8 +108,9 @@ std::vector<std::string> Ledger::mistakes() const {
 
 std::string Ledger::Report() const {
   std::string text;
-  for (const auto& [kind, count] : held())
-    text += std::to_string(count) + " of " + kind + " left\n";
+  for (const auto& [suite, count] : held()) {
+    text += std::to_string(count) + " of suite " + suite + " left\n";
+  }
   for (const std::string& mistake : mistakes()) text += mistake + "\n";
   return text;
 }

@@ -2,10 +2,12 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <mutex>
 #include <set>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "platform/hx/hx_types.h"
@@ -61,18 +63,19 @@ inline HX_Err BeginOperation(const char* name) {
   return Operations::Get().Begin(name);
 }
 
-// What the plug-in holds of the host, by kind ("handle", "world", "suite <name>", ...), and what it
-// gave back that it did not hold. One in a process. Any thread.
+// The suites that the plug-in holds, by name, and what it did wrong, as giving back what it did not
+// hold. One in a process. Any thread.
 class Ledger {
  public:
   static Ledger& Get();
 
-  void Take(const std::string& kind, std::int64_t count = 1);
-  // A kind that falls below 0 is a mistake, and stays at 0.
-  void GiveBack(const std::string& kind, std::int64_t count = 1);
-  void Mistake(const std::string& what);  // the first 100 are kept
+  void Take(std::string_view suite);
+  // One that is not held is a mistake.
+  void GiveBack(std::string_view suite) noexcept;
+  // The line is both texts. The first 100 are kept, as far as there is memory.
+  void Mistake(std::string_view where, std::string_view what = {}) noexcept;
 
-  // Kinds with a count above 0.
+  // Those with a count above 0.
   std::map<std::string, std::int64_t> held() const;
   std::vector<std::string> mistakes() const;
   // One line for each of both; empty when all is in order.
@@ -82,8 +85,8 @@ class Ledger {
 
  private:
   mutable std::mutex mutex_;
-  std::map<std::string, std::int64_t> held_;  // guarded by mutex_
-  std::vector<std::string> mistakes_;         // guarded by mutex_
+  std::map<std::string, std::int64_t, std::less<>> held_;  // guarded by mutex_
+  std::vector<std::string> mistakes_;                      // guarded by mutex_
 };
 
 }  // namespace calmframe::host

@@ -1,24 +1,28 @@
+#include <cstdio>
+
 #include "host/effects/interface_guard.h"
 #include "host/effects/interface_tables.h"
 
+// A plug-in needs suites to give back what it has, so that they are to be had without memory.
 namespace calmframe::host {
 namespace {
 
 HX_Err Acquire(const char* name, std::int32_t version, const void** table) {
-  const std::string suite = name ? name : "";
-  const HX_Err code = WithHost(("acquire " + suite).c_str(), [&](Host& host) -> HX_Err {
+  const std::string_view suite = name ? name : "";
+  char operation[128];
+  std::snprintf(operation, sizeof operation, "acquire %s", name ? name : "");
+  return WithHost(operation, [&](Host& host) -> HX_Err {
     const void* found = FindEffectSuite(suite, version);
     if (!found) found = host.media().FindSuite(suite, version);
     if (!found) return HX_ERR_MISSING_SUITE;
+    Ledger::Get().Take(suite);
     *table = found;
-    Ledger::Get().Take("suite " + suite);
     return HX_ERR_NONE;
   });
-  return code;
 }
 
 HX_Err Release(const char* name, std::int32_t) {
-  Ledger::Get().GiveBack(std::string("suite ") + (name ? name : ""));
+  Ledger::Get().GiveBack(name ? name : "");
   return HX_ERR_NONE;
 }
 

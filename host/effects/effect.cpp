@@ -1,15 +1,20 @@
 #include "host/effects/effect.h"
 
+#include <new>
 #include <utility>
 
 #include "host/effects/host.h"
 
 namespace calmframe::host {
 
-Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position)
+Effect::Effect(Host& host, boost::shared_ptr<Layer> layer)
     : host_(host),
       shared_(std::make_shared<TimelineEffect>(std::move(layer), host.declarations())),
-      instance_(Instance::Make(host, shared_)) {
+      instance_(Instance::Make(host, shared_)) {}
+
+// What is thrown from here on meets the destructor.
+Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position)
+    : Effect(host, std::move(layer)) {
   PutOnLayer(position);
   creation_ = Command(HX_CMD_CREATE_INSTANCE);
   Refresh();
@@ -18,9 +23,7 @@ Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position)
 
 Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position,
                const SavedEffect& saved)
-    : host_(host),
-      shared_(std::make_shared<TimelineEffect>(std::move(layer), host.declarations())),
-      instance_(Instance::Make(host, shared_)) {
+    : Effect(host, std::move(layer)) {
   shared_->params().SetValues(saved.values);
   PutOnLayer(position);
   if (saved.match_name != host.library().properties().match_name) {
@@ -72,8 +75,14 @@ CommandResult Effect::Restore() {
 }
 
 CommandResult Effect::SetParam(std::int32_t index, double value) {
+  const std::optional<HX_ParamDef> before = Param(index);
   if (!shared_->params().SetByUser(index, value)) return {HX_ERR_UNKNOWN, "No such control"};
-  shared_->layer()->SetParameters(shared_->runtime_id(), shared_->params().SettingsText());
+  try {
+    shared_->layer()->SetParameters(shared_->runtime_id(), shared_->params().SettingsText());
+  } catch (const std::bad_alloc&) {
+    shared_->params().SetByPlugin(index, *before);
+    return {HX_ERR_MEMORY, {}};
+  }
   shared_->InvalidateRenders();
   return TellChange(index);
 }
@@ -108,14 +117,17 @@ CommandResult Effect::Refresh() {
 CommandResult Effect::Save(SavedEffect* saved) {
   CommandResult result = Command(HX_CMD_FLATTEN_INSTANCE);
   if (!result.ok()) return result;
+  flattened_ = instance_->handle();
   SavedEffect now;
-  now.match_name = host_.library().properties().match_name;
-  now.values = shared_->params().Values();
-  if (instance_->handle()) {
-    flattened_ = instance_->handle();
-    now.instance = host_.handles().BytesOf(flattened_);
-    result = Restore();
+  try {
+    now.match_name = host_.library().properties().match_name;
+    now.values = shared_->params().Values();
+    if (flattened_) now.instance = host_.handles().BytesOf(flattened_);
+  } catch (const std::bad_alloc&) {
+    if (flattened_) Restore();
+    return {HX_ERR_MEMORY, {}};
   }
+  if (flattened_) result = Restore();
   *saved = std::move(now);
   return result;
 }

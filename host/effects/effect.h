@@ -62,6 +62,7 @@ class Effect {
   const void* opaque_data() const;
 
  private:
+  Effect(Host& host, boost::shared_ptr<Layer> layer);  // on no layer yet
   void PutOnLayer(std::size_t position);
   CommandResult Command(std::uint32_t command, void* extra = nullptr);
   // Takes a flattened handle back into work.

@@ -270,8 +270,8 @@ constexpr HX_OpaqueEffectDataSuite1 kOpaqueEffectData = {FindOpaque, SetOpaque, 
 
 }  // namespace
 
-const void* FindEffectSuite(const std::string& name, std::int32_t version) {
-  static const std::map<std::pair<std::string, std::int32_t>, const void*> suites = {
+const void* FindEffectSuite(std::string_view name, std::int32_t version) {
+  static const std::map<std::pair<std::string_view, std::int32_t>, const void*> suites = {
       {{HX_PARAM_UTILS_SUITE, HX_PARAM_UTILS_SUITE_VERSION}, &kParamUtils},
       {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_3}, &kUtility},
       {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_4}, &kUtility},

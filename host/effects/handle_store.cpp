@@ -4,7 +4,6 @@
 #include <cstring>
 #include <limits>
 #include <new>
-#include <string>
 #include <utility>
 
 #include "host/base/operations.h"
@@ -24,7 +23,7 @@ std::unique_ptr<std::uint8_t[]> NewBytes(std::uint64_t size) {
 HandleStore::Block* HandleStore::Find(HX_Handle handle, const char* operation) {
   const auto found = blocks_.find(reinterpret_cast<std::uintptr_t>(handle));
   if (found != blocks_.end()) return &found->second;
-  Ledger::Get().Mistake(std::string(operation) + ": unknown handle");
+  Ledger::Get().Mistake(operation, ": unknown handle");
   return nullptr;
 }
 

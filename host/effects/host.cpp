@@ -1,6 +1,7 @@
 #include "host/effects/host.h"
 
 #include <cstring>
+#include <new>
 #include <stdexcept>
 
 #include "host/base/operations.h"
@@ -121,7 +122,10 @@ CommandResult Host::Command(std::uint32_t command, HX_InData& in, HX_OutData& ou
   }
   if (out.global_data != global_data) global_data_ = out.global_data;
   if (out.out_flags & HX_OUT_FLAG_SHOW_MESSAGE) {
-    result.message.assign(out.return_msg, strnlen(out.return_msg, sizeof(out.return_msg)));
+    try {
+      result.message.assign(out.return_msg, strnlen(out.return_msg, sizeof(out.return_msg)));
+    } catch (const std::bad_alloc&) {  // what the command did counts for more
+    }
   }
   return result;
 }

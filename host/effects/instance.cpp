@@ -1,5 +1,6 @@
 #include "host/effects/instance.h"
 
+#include <new>
 #include <optional>
 #include <utility>
 #include <vector>
@@ -32,17 +33,11 @@ Instance::~Instance() {
   host_.media().DetachEffect(ref_);
 }
 
-CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World* output,
-                             void* extra, HX_OutData* out) {
-  std::optional<RenderContext> own;
-  RenderContext* frames = place.frames;
-  if (!frames) {
-    frames = &own.emplace(host_.media(), ref_, effect_->layer()->state(), 8, HX_Ratio{1, 1},
-                          HX_Ratio{1, 1});
-  }
-  const SourceInfo& source = frames->layer().source->info();
-  const LayerTime time(frames->layer());
-
+// From here on nothing needs memory: the plug-in takes everything apart on this way too.
+CommandResult Instance::Run(std::uint32_t command, const Place& place, RenderContext& frames,
+                            HX_ParamDef** params, HX_World* output, void* extra, HX_OutData& out) {
+  const SourceInfo& source = frames.layer().source->info();
+  const LayerTime time(frames.layer());
   HX_InData in{};
   in.effect_ref = ref_;
   in.instance_handle = handle_;
@@ -53,41 +48,54 @@ CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World
   in.time_step = time.step();
   in.total_time = time.total();
   in.time_scale = time.scale();
-  in.downsample_x = frames->downsample_x();
-  in.downsample_y = frames->downsample_y();
+  in.downsample_x = frames.downsample_x();
+  in.downsample_y = frames.downsample_y();
+  frames_ = &frames;
+  SetLayerOfCall(frames.shared_layer());
+  CommandResult result = host_.Command(command, in, out, params, output, extra);
+  SetLayerOfCall(nullptr);
+  frames_ = nullptr;
+  handle_ = out.instance_handle;
+  if (!result.message.empty()) effect_->AddMessage(result.message);
+  return result;
+}
 
-  std::vector<HX_ParamDef> params =
-      frames->frozen_params().empty() ? effect_->params().All() : frames->frozen_params();
+CommandResult Instance::Call(std::uint32_t command, const Place& place, HX_World* output,
+                             void* extra, HX_OutData* out) {
+  std::optional<RenderContext> own;
+  RenderContext& frames = place.frames ? *place.frames : FullFrames(own);
+  std::vector<HX_ParamDef> params;
+  std::vector<HX_ParamDef*> pointers;
+  try {
+    params = frames.frozen_params().empty() ? effect_->params().All() : frames.frozen_params();
+    for (HX_ParamDef& param : params) pointers.push_back(&param);
+  } catch (const std::bad_alloc&) {
+    return {HX_ERR_MEMORY, {}};
+  }
+  for (HX_ParamDef& param : params) param.change_flag = 0;
   HX_World& input = params[0].u.ld;
   if (place.input) {
     input = *place.input;
   } else {
     input = {};
-    input.width = frames->width();
-    input.height = frames->height();
-    input.format = FormatOfDepth(frames->bit_depth());
+    input.width = frames.width();
+    input.height = frames.height();
+    input.format = FormatOfDepth(frames.bit_depth());
   }
-  std::vector<HX_ParamDef*> pointers;
-  for (HX_ParamDef& param : params) {
-    param.change_flag = 0;
-    pointers.push_back(&param);
-  }
-
   HX_OutData answered{};
-  if (!out) out = &answered;
-  frames_ = frames;
-  SetLayerOfCall(frames->shared_layer());
-  const CommandResult result = host_.Command(command, in, *out, pointers.data(), output, extra);
-  SetLayerOfCall(nullptr);
-  frames_ = nullptr;
-  handle_ = out->instance_handle;
+  CommandResult result =
+      Run(command, place, frames, pointers.data(), output, extra, out ? *out : answered);
   for (std::size_t i = 1; i < params.size(); ++i) {
     if (!params[i].change_flag) continue;
     effect_->params().SetByPlugin(static_cast<std::int32_t>(i), params[i]);
     effect_->InvalidateRenders();
   }
-  if (!result.message.empty()) effect_->AddMessage(result.message);
   return result;
+}
+
+RenderContext& Instance::FullFrames(std::optional<RenderContext>& own) const {
+  return own.emplace(host_.media(), ref_, effect_->layer()->state(), 8, HX_Ratio{1, 1},
+                     HX_Ratio{1, 1});
 }
 
 void Instance::SetLayerOfCall(boost::shared_ptr<const LayerState> layer) {
@@ -110,9 +118,15 @@ std::optional<HX_ParamDef> Instance::Param(std::int32_t index) const {
   return params[static_cast<std::size_t>(index)];
 }
 
-void Instance::Destroy(const Place& place) {
+void Instance::Destroy(const Place& place) noexcept {
   for (int tries = 0; tries < 2; ++tries) {
-    if (Call(HX_CMD_DESTROY_INSTANCE, place).ok() || !handle_) break;
+    std::optional<RenderContext> frames;
+    HX_OutData out{};
+    if (Run(HX_CMD_DESTROY_INSTANCE, place, FullFrames(frames), nullptr, nullptr, nullptr, out)
+            .ok() ||
+        !handle_) {
+      break;
+    }
   }
   if (handle_) Ledger::Get().Mistake("DestroyInstance: the handle is still there");
 }

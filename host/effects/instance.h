@@ -54,13 +54,14 @@ class Instance {
   // Runs the command with the records preset, all parameters in place (those that `frames` froze,
   // if it did), the handles taken back and the message kept, whatever the result. `out`, if given,
   // holds the presets that the command needs and then what it answered. Values that the plug-in
-  // replaced in its parameters, by change_flag, are taken over.
+  // replaced in its parameters, by change_flag, are taken over. HX_ERR_MEMORY, and no call, where
+  // there is no memory for the records.
   CommandResult Call(std::uint32_t command, const Place& place, HX_World* output = nullptr,
                      void* extra = nullptr, HX_OutData* out = nullptr);
 
-  // Takes the instance apart; tried a second time when the plug-in fails and keeps the handle. One
-  // that is kept still is a mistake in the Ledger.
-  void Destroy(const Place& place);
+  // Takes the instance apart, without parameters; tried a second time when the plug-in fails and
+  // keeps the handle. One that is kept still is a mistake in the Ledger.
+  void Destroy(const Place& place) noexcept;
 
   // As the call that is under way sees it, for the interface's functions; none outside the table.
   std::optional<HX_ParamDef> Param(std::int32_t index) const;
@@ -73,6 +74,10 @@ class Instance {
  private:
   Instance(Host& host, std::shared_ptr<TimelineEffect> effect);
 
+  CommandResult Run(std::uint32_t command, const Place& place, RenderContext& frames,
+                    HX_ParamDef** params, HX_World* output, void* extra, HX_OutData& out);
+  // In `own`: for a call of no render.
+  RenderContext& FullFrames(std::optional<RenderContext>& own) const;
   void SetLayerOfCall(boost::shared_ptr<const LayerState> layer);
 
   Host& host_;

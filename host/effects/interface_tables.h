@@ -1,7 +1,7 @@
 #pragma once
 
 #include <cstdint>
-#include <string>
+#include <string_view>
 
 #include "platform/hx/hx_effect.h"
 
@@ -17,6 +17,6 @@ void SetPlanFunctions(HX_PlanExtra& plan);
 void SetRenderFunctions(HX_RenderExtra& render);
 
 // Tables of the suites that are not the media services'; null for an unknown name or version.
-const void* FindEffectSuite(const std::string& name, std::int32_t version);
+const void* FindEffectSuite(std::string_view name, std::int32_t version);
 
 }  // namespace calmframe::host

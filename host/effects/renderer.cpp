@@ -1,5 +1,7 @@
 #include "host/effects/renderer.h"
 
+#include <memory>
+#include <new>
 #include <optional>
 #include <utility>
 
@@ -83,13 +85,32 @@ Renderer::~Renderer() {
   instance_->Destroy({});
 }
 
-RenderedFrame Renderer::Direct(const RenderRequest& request) {
+template <class Draw>
+RenderedFrame Renderer::Render(const RenderRequest& request, bool planned, const Draw& draw) {
   RenderedFrame rendered;
   rendered.generation = instance_->effect()->generation();
-  if (!Serves(request, false)) {
+  if (!Serves(request, planned)) {
     rendered.result.code = kBadRequest;
     return rendered;
   }
+  try {
+    draw(rendered);
+  } catch (const std::bad_alloc&) {
+    rendered.pixels.reset();
+    rendered.result = {HX_ERR_MEMORY, {}};
+  }
+  return rendered;
+}
+
+RenderedFrame Renderer::Direct(const RenderRequest& request) {
+  return Render(request, false, [&](RenderedFrame& rendered) { DrawDirect(request, rendered); });
+}
+
+RenderedFrame Renderer::Planned(const RenderRequest& request) {
+  return Render(request, true, [&](RenderedFrame& rendered) { DrawPlanned(request, rendered); });
+}
+
+void Renderer::DrawDirect(const RenderRequest& request, RenderedFrame& rendered) {
   RenderContext frames(host_.media(), instance_->ref(), instance_->effect()->layer()->state(),
                        request.bit_depth, request.downsample, request.downsample);
   frames.FreezeParams(instance_->effect()->params().All());
@@ -97,8 +118,10 @@ RenderedFrame Renderer::Direct(const RenderRequest& request) {
   rendered.layer_height = frames.height();
 
   const LayerTime time(frames.layer());
-  const HX_World* input = frames.CheckOutInput(
+  const HX_World* const input = frames.CheckOutInput(
       time.MediaTicks(time.OfFrame(request.frame, request.second_field), time.scale()));
+  const auto check_in = [&frames](const HX_World* held) { frames.CheckInInput(held->data); };
+  const std::unique_ptr<const HX_World, decltype(check_in)> holds(input, check_in);
   // Where the media has no frame the layer is clear.
   std::optional<WorldBuffer> clear;
   HX_World world =
@@ -127,17 +150,9 @@ RenderedFrame Renderer::Direct(const RenderRequest& request) {
       }
     }
   }
-  if (input) frames.CheckInInput(input->data);
-  return rendered;
 }
 
-RenderedFrame Renderer::Planned(const RenderRequest& request) {
-  RenderedFrame rendered;
-  rendered.generation = instance_->effect()->generation();
-  if (!Serves(request, true)) {
-    rendered.result.code = kBadRequest;
-    return rendered;
-  }
+void Renderer::DrawPlanned(const RenderRequest& request, RenderedFrame& rendered) {
   RenderContext frames(host_.media(), instance_->ref(), instance_->effect()->layer()->state(),
                        request.bit_depth, request.downsample, request.downsample);
   frames.FreezeParams(instance_->effect()->params().All());
@@ -150,16 +165,16 @@ RenderedFrame Renderer::Planned(const RenderRequest& request) {
   plan.request.bit_depth = request.bit_depth;
   SetPlanFunctions(plan);
   rendered.result = instance_->Call(HX_CMD_PLAN_FRAME, place, nullptr, &plan);
-  if (!rendered.result.ok()) return rendered;
+  if (!rendered.result.ok()) return;
   rendered.full_rect = plan.full_rect;
   const HX_Rect wanted =
       plan.may_exceed ? plan.result_rect : Intersect(plan.result_rect, plan.request.rect);
   if (IsAbsurd(wanted)) {
     rendered.result.code = kBadRequest;
-    return rendered;
+    return;
   }
   frames.SetOutput(OutputFor(host_, wanted, request.bit_depth));
-  if (!frames.output()) return rendered;
+  if (!frames.output()) return;
 
   HX_RenderExtra render{};
   render.request = plan.request;
@@ -167,7 +182,6 @@ RenderedFrame Renderer::Planned(const RenderRequest& request) {
   rendered.result = instance_->Call(HX_CMD_RENDER_PLANNED_FRAME, place, nullptr, &render);
   CheckPadding(*frames.output(), host_);
   if (rendered.result.ok()) rendered.pixels = frames.output();
-  return rendered;
 }
 
 }  // namespace calmframe::host

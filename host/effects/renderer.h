@@ -10,8 +10,8 @@
 namespace calmframe::host {
 
 struct RenderRequest {
-  std::int64_t frame = 0;     // of the layer, counted from its in-point
-  int bit_depth = 8;          // 8 or 16; 32 on the planned path alone
+  std::int64_t frame = 0;  // of the layer, counted from its in-point
+  int bit_depth = 8;       // 8 or 16; 32 on the planned path alone
   HX_Ratio downsample{1, 1};
   // Part of the frame that is wanted, in layer coordinates at render scale; none: the whole.
   std::optional<HX_Rect> part = {};
@@ -36,7 +36,7 @@ struct RenderedFrame {
 class Renderer {
  public:
   // See Effect::MakeRenderer. result() tells whether the plug-in made the instance; without it
-  // frames still come, as the plug-in can.
+  // frames still come, as the plug-in can. A frame that there is no memory for has HX_ERR_MEMORY.
   Renderer(Host& host, std::shared_ptr<TimelineEffect> effect);
   ~Renderer();
   Renderer(const Renderer&) = delete;
@@ -51,6 +51,11 @@ class Renderer {
   RenderedFrame Planned(const RenderRequest& request);
 
  private:
+  void DrawDirect(const RenderRequest& request, RenderedFrame& rendered);
+  void DrawPlanned(const RenderRequest& request, RenderedFrame& rendered);
+  template <class Draw>
+  RenderedFrame Render(const RenderRequest& request, bool planned, const Draw& draw);
+
   Host& host_;
   const std::shared_ptr<Instance> instance_;
   CommandResult result_;

@@ -1,5 +1,6 @@
 #include "host/effects/timeline_effect.h"
 
+#include <new>
 #include <utility>
 
 namespace calmframe::host {
@@ -20,10 +21,13 @@ TimelineEffect::TimelineEffect(boost::shared_ptr<Layer> layer, std::vector<HX_Pa
       runtime_id_(NewRuntimeId()),
       params_(std::move(declared)) {}
 
-void TimelineEffect::AddMessage(const std::string& text) {
-  std::lock_guard lock(mutex_);
-  if (messages_.size() == kMessages) messages_.erase(messages_.begin());
-  messages_.push_back(text);
+void TimelineEffect::AddMessage(const std::string& text) noexcept {
+  try {
+    std::lock_guard lock(mutex_);
+    if (messages_.size() == kMessages) messages_.erase(messages_.begin());
+    messages_.push_back(text);
+  } catch (const std::bad_alloc&) {
+  }
 }
 
 std::vector<std::string> TimelineEffect::TakeMessages() {

@@ -29,8 +29,8 @@ class TimelineEffect {
   void InvalidateRenders() { ++generation_; }
 
   // What the plug-in wanted the user to see, oldest first; each is given out once. Past 100 the
-  // oldest go.
-  void AddMessage(const std::string& text);
+  // oldest go; one that there is no memory for is lost.
+  void AddMessage(const std::string& text) noexcept;
   std::vector<std::string> TakeMessages();
 
   // Outline of a frame as its last render told it, x and y of each vertex; empty if none did.

@@ -11,30 +11,37 @@ PicturePtr FrameCache::Find(const Guid& identifier) {
   return entry.picture;
 }
 
-PicturePtr FrameCache::Insert(const Guid& identifier, const PicturePtr& picture) {
-  std::list<PicturePtr> dropped;
-  std::lock_guard lock(mutex_);
+FrameCache::Entry& FrameCache::EntryOf(const Guid& identifier) {
+  std::list<Guid> place = {identifier};
   const auto [at, made] = entries_.try_emplace(identifier);
-  Entry& entry = at->second;
+  if (made) {
+    at->second.place = place.begin();
+    unused_.splice(unused_.end(), place);
+  }
+  return at->second;
+}
+
+PicturePtr FrameCache::Insert(const Guid& identifier, const PicturePtr& picture) {
+  Entries dropped;
+  std::lock_guard lock(mutex_);
+  Entry& entry = EntryOf(identifier);
   if (entry.picture) return entry.picture;
   entry.picture = picture;
   bytes_ += picture->bytes();
-  if (made) entry.place = unused_.insert(unused_.end(), identifier);
   dropped = Trim();
   return picture;
 }
 
 void FrameCache::Reference(const Guid& identifier) {
   std::lock_guard lock(mutex_);
-  const auto [at, made] = entries_.try_emplace(identifier);
-  Entry& entry = at->second;
-  if (!made && entry.references == 0) unused_.erase(entry.place);
+  Entry& entry = EntryOf(identifier);
+  if (entry.references == 0) entry.kept.splice(entry.kept.begin(), unused_, entry.place);
   ++entry.references;
   ++references_;
 }
 
 void FrameCache::Dereference(const Guid& identifier) {
-  std::list<PicturePtr> dropped;
+  Entries dropped;
   std::lock_guard lock(mutex_);
   const auto found = entries_.find(identifier);
   if (found == entries_.end() || found->second.references == 0) return;
@@ -44,24 +51,23 @@ void FrameCache::Dereference(const Guid& identifier) {
     entries_.erase(found);
     return;
   }
-  found->second.place = unused_.insert(unused_.end(), identifier);
+  unused_.splice(unused_.end(), found->second.kept);
   dropped = Trim();
 }
 
 void FrameCache::SetBound(std::size_t bytes) {
-  std::list<PicturePtr> dropped;
+  Entries dropped;
   std::lock_guard lock(mutex_);
   bound_ = bytes;
   dropped = Trim();
 }
 
-std::list<PicturePtr> FrameCache::Trim() {
-  std::list<PicturePtr> dropped;
+FrameCache::Entries FrameCache::Trim() {
+  Entries dropped;
   while (bytes_ > bound_ && !unused_.empty()) {
     const auto found = entries_.find(unused_.front());
     bytes_ -= found->second.picture->bytes();
-    dropped.push_back(std::move(found->second.picture));
-    entries_.erase(found);
+    dropped.insert(entries_.extract(found));
     unused_.pop_front();
   }
   return dropped;

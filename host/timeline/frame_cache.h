@@ -37,12 +37,17 @@ class FrameCache {
   struct Entry {
     PicturePtr picture;  // null: referenced before it exists
     std::size_t references = 0;
-    std::list<Guid>::iterator place;  // in unused_ where references is 0
+    // Its own place, from the beginning, so that giving back needs no memory: in unused_ where
+    // references is 0, else in kept.
+    std::list<Guid>::iterator place;
+    std::list<Guid> kept;
   };
   using Entries = std::map<Guid, Entry>;
 
+  // The entry of the identifier; a new one has no references.
+  Entry& EntryOf(const Guid& identifier);
   // Takes out what the bound has no room for; the caller lets go of it unlocked.
-  std::list<PicturePtr> Trim();
+  Entries Trim();
 
   mutable std::mutex mutex_;  // guards all below
   std::size_t bound_;

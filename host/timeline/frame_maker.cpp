@@ -3,6 +3,7 @@
 #include <boost/make_shared.hpp>
 #include <cstring>
 #include <exception>
+#include <new>
 
 #include "host/pixels/world_buffer.h"
 
@@ -21,19 +22,23 @@ PicturePtr FrameMaker::Get(const FrameRequest& request, const FrameLayout& layou
   const Guid identifier = IdentifierOf(request);
   std::unique_lock lock(mutex_);
   if (const PicturePtr cached = cache_.Find(identifier)) return cached;
-  boost::shared_ptr<Making>& place = makings_[identifier];
-  if (place) {
-    const boost::shared_ptr<Making> making = place;
+  if (const auto under_way = makings_.find(identifier); under_way != makings_.end()) {
+    const boost::shared_ptr<Making> making = under_way->second;
     made_.wait(lock, [&] { return making->done; });
+    if (making->out_of_memory) throw std::bad_alloc();
     // It may have left the cache already, before a reference came that is to keep it.
     return making->picture ? cache_.Insert(identifier, making->picture) : nullptr;
   }
-  const boost::shared_ptr<Making> making = place = boost::make_shared<Making>();
+  const auto making = boost::make_shared<Making>();
+  makings_.emplace(identifier, making);
   lock.unlock();
   PicturePtr picture;
+  bool out_of_memory = false;
   try {
     picture = Make(request, layout);
     if (picture) picture = cache_.Insert(identifier, picture);
+  } catch (const std::bad_alloc&) {
+    out_of_memory = true;
   } catch (const std::exception& error) {
     Keep(error.what());
   } catch (...) {
@@ -41,9 +46,11 @@ PicturePtr FrameMaker::Get(const FrameRequest& request, const FrameLayout& layou
   }
   lock.lock();
   making->picture = picture;
+  making->out_of_memory = out_of_memory;
   making->done = true;
   makings_.erase(identifier);
   made_.notify_all();
+  if (out_of_memory) throw std::bad_alloc();
   return picture;
 }
 
@@ -87,9 +94,12 @@ std::string FrameMaker::failure() const {
   return failure_;
 }
 
-void FrameMaker::Keep(const std::string& line) {
-  std::lock_guard lock(mutex_);
-  if (failure_.empty()) failure_ = line;
+void FrameMaker::Keep(const char* line) noexcept {
+  try {
+    std::lock_guard lock(mutex_);
+    if (failure_.empty()) failure_ = line;
+  } catch (const std::bad_alloc&) {  // those who wait for the frame must hear of it all the same
+  }
 }
 
 }  // namespace calmframe::host

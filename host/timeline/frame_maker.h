@@ -36,7 +36,7 @@ class FrameMaker {
   explicit FrameMaker(FrameCache& cache) : cache_(cache), pool_(PicturePool::Make()) {}
 
   // From the cache, else made on this thread. Null where the media has no such frame, and on a
-  // failure.
+  // failure; std::bad_alloc without memory.
   PicturePtr Get(const FrameRequest& request, const FrameLayout& layout);
 
   boost::shared_ptr<Picture> Copy(const Picture& picture, const FrameLayout& layout);
@@ -46,11 +46,11 @@ class FrameMaker {
 
  private:
   struct Making {
-    bool done = false;
+    bool done = false, out_of_memory = false;
     PicturePtr picture;
   };
   PicturePtr Make(const FrameRequest& request, const FrameLayout& layout);
-  void Keep(const std::string& line);
+  void Keep(const char* line) noexcept;
 
   FrameCache& cache_;
   const boost::shared_ptr<PicturePool> pool_;

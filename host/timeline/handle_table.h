@@ -32,12 +32,10 @@ class HandleTable {
 
   // False if there is no such number.
   bool Remove(Number number) {
-    std::unordered_map<Number, Value> removed;
+    typename std::unordered_map<Number, Value>::node_type removed;  // destroyed unlocked
     std::lock_guard lock(mutex_);
-    const auto found = values_.find(number);
-    if (found == values_.end()) return false;
-    removed.insert(values_.extract(found));  // destroyed unlocked
-    return true;
+    removed = values_.extract(number);
+    return !removed.empty();
   }
 
   std::size_t size() const {

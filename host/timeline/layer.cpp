@@ -4,6 +4,7 @@
 #include <atomic>
 #include <boost/make_shared.hpp>
 #include <limits>
+#include <new>
 #include <stdexcept>
 
 namespace calmframe::host {
@@ -32,10 +33,14 @@ boost::shared_ptr<const LayerState> Layer::state() const {
 void Layer::Change(const std::function<void(LayerState& state)>& change) {
   std::lock_guard one(changing_);
   const auto changed = boost::make_shared<LayerState>(*state());
+  std::erase_if(changed->effects, [this](const EffectOperator& effect) {
+    return std::count(leaving_.begin(), leaving_.end(), effect.runtime_id) > 0;
+  });
   change(*changed);
   if (!changed->source || changed->ticks_per_frame < 1) {
     throw std::invalid_argument("a layer needs a source and a frame duration");
   }
+  leaving_.clear();
   boost::shared_ptr<const LayerState> state = changed;  // goes with the old one, unlocked
   std::lock_guard lock(mutex_);
   state_.swap(state);
@@ -55,16 +60,22 @@ void Layer::Resize(int width, int height) {
 
 void Layer::InsertEffect(std::size_t position, const EffectOperator& effect) {
   Change([&](LayerState& state) {
+    leaving_.reserve(leaving_.size() + state.effects.size() + 1);
     const std::size_t place = std::min(position, state.effects.size());
     state.effects.insert(state.effects.begin() + static_cast<std::ptrdiff_t>(place), effect);
   });
 }
 
-void Layer::RemoveEffect(std::uint32_t runtime_id) {
-  Change([&](LayerState& state) {
-    std::erase_if(state.effects,
-                  [&](const EffectOperator& effect) { return effect.runtime_id == runtime_id; });
-  });
+void Layer::RemoveEffect(std::uint32_t runtime_id) noexcept {
+  try {
+    Change([&](LayerState& state) {
+      std::erase_if(state.effects,
+                    [&](const EffectOperator& effect) { return effect.runtime_id == runtime_id; });
+    });
+  } catch (const std::bad_alloc&) {
+    std::lock_guard one(changing_);
+    if (leaving_.size() < leaving_.capacity()) leaving_.push_back(runtime_id);
+  }
 }
 
 void Layer::SetParameters(std::uint32_t runtime_id, const std::string& parameters) {

@@ -59,12 +59,15 @@ class Layer {
 
   // At `position` of the chain, 0 next to the source; limited to its end.
   void InsertEffect(std::size_t position, const EffectOperator& effect);
-  void RemoveEffect(std::uint32_t runtime_id);
+  // Without memory the effect goes with the next change.
+  void RemoveEffect(std::uint32_t runtime_id) noexcept;
   // New identity text of an effect's settings.
   void SetParameters(std::uint32_t runtime_id, const std::string& parameters);
 
  private:
   std::mutex changing_;  // held by one change at a time
+  // Effects that go with the next change; has room for all that are there. Guarded by changing_.
+  std::vector<std::uint32_t> leaving_;
   mutable std::mutex mutex_;
   boost::shared_ptr<const LayerState> state_;  // guarded by mutex_
 };

@@ -74,7 +74,7 @@ HX_Err GivingBack(const char* name, Body body) noexcept {
     MediaCore* const core = MediaCore::active();
     if (!core) return HX_ERR_UNKNOWN;
     if (!body(*core)) {
-      Ledger::Get().Mistake(std::string(name) + " of what is not lent");
+      Ledger::Get().Mistake(name, " of what is not lent");
       return HX_ERR_UNKNOWN;
     }
     return code;

@@ -62,7 +62,7 @@ MediaServices* MediaServices::active() {
   return active_services;
 }
 
-const void* MediaServices::FindSuite(const std::string& name, std::int32_t version) const {
+const void* MediaServices::FindSuite(std::string_view name, std::int32_t version) const {
   const struct {
     const char* name;
     std::int32_t version;

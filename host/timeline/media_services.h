@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <memory>
 #include <string>
+#include <string_view>
 
 #include "host/timeline/layer.h"
 #include "platform/hx/hx_suites.h"
@@ -70,7 +71,7 @@ class MediaServices {
   static MediaServices* active();  // null when there is none
 
   // Table of a suite; null for one that is not of this half of the host.
-  const void* FindSuite(const std::string& name, std::int32_t version) const;
+  const void* FindSuite(std::string_view name, std::int32_t version) const;
 
   // Puts the effect on the layer. Its operator must stand in the layer's chain, under this id,
   // for its nodes to be found. Attached anew, an effect changes over to the other layer.

@@ -12,7 +12,13 @@ thread_local const RenderQueue* own_queue = nullptr;
 }  // namespace
 
 RenderQueue::RenderQueue(int threads) {
-  for (int i = 0; i < threads; ++i) threads_.emplace_back([this] { Run(); });
+  try {
+    threads_.reserve(static_cast<std::size_t>(threads));
+    for (int i = 0; i < threads; ++i) threads_.emplace_back([this] { Run(); });
+  } catch (...) {
+    Close();
+    throw;
+  }
 }
 
 RenderQueue::~RenderQueue() {

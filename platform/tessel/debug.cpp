@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <map>
 #include <mutex>
+#include <new>
 #include <sstream>
 #include <thread>
 
@@ -147,12 +148,15 @@ TimingEntry::TimingEntry(const std::string& channel, int level, const std::strin
 TimingEntry::~TimingEntry() {
   if (!enabled_) return;
   const auto elapsed = std::chrono::steady_clock::now() - begin_;
-  std::ostringstream line;
-  line << "End - " << text_ << " ["
-       << boost::posix_time::microseconds(
-              std::chrono::duration_cast<std::chrono::microseconds>(elapsed).count())
-       << " elapsed]";
-  Trace(channel_, level_, line.str());
+  try {
+    std::ostringstream line;
+    line << "End - " << text_ << " ["
+         << boost::posix_time::microseconds(
+                std::chrono::duration_cast<std::chrono::microseconds>(elapsed).count())
+         << " elapsed]";
+    Trace(channel_, level_, line.str());
+  } catch (const std::bad_alloc&) {
+  }
 }
 
 }  // namespace tessel::debug

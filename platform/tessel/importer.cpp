@@ -2,7 +2,6 @@
 
 #include <map>
 #include <mutex>
-#include <vector>
 
 namespace tessel::importer {
 namespace {
@@ -42,13 +41,12 @@ void UnregisterPauseCallback(const utility::Guid& id) {
 void PauseBackgroundWork(bool pause) {
   std::lock_guard<std::recursive_mutex> lock(callbacks().mutex);
   callbacks().paused = pause;
-  std::vector<utility::Guid> ids;
-  for (const auto& [id, callback] : callbacks().by_id) ids.push_back(id);
-  for (const utility::Guid& id : ids) {
-    const auto found = callbacks().by_id.find(id);
-    if (found == callbacks().by_id.end()) continue;
-    const boost::function<void(bool)> callback = found->second;
+  // One that comes meanwhile is told by its registration.
+  for (auto next = callbacks().by_id.begin(); next != callbacks().by_id.end();) {
+    const utility::Guid id = next->first;
+    const boost::function<void(bool)> callback = next->second;
     callback(pause);
+    next = callbacks().by_id.upper_bound(id);
   }
 }
 

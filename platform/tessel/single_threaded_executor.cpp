@@ -100,26 +100,27 @@ class Pool {
     const auto queue = boost::make_shared<Queue>();
     std::lock_guard<std::mutex> lock(mutex_);
     if (ending_) queue->EndQueue();
-    if (idle_ > static_cast<int>(waiting_.size())) {
-      waiting_.push_back(queue);
-      work_.notify_one();
-    } else {
-      StartThread(queue);
-    }
     live_.insert(queue);
+    try {
+      if (idle_ > static_cast<int>(waiting_.size())) {
+        waiting_.push_back(queue);
+        work_.notify_one();
+      } else {
+        StartThread(queue);
+      }
+    } catch (...) {
+      live_.erase(queue);
+      throw;
+    }
     return queue;
   }
 
   // Until FinishEnding, queues are borrowed ended and no thread stays idle.
   void BeginEnding() {
-    std::set<boost::shared_ptr<Queue>> live;
-    {
-      std::lock_guard<std::mutex> lock(mutex_);
-      ending_ = true;
-      work_.notify_all();
-      live = live_;
-    }
-    for (const auto& queue : live) queue->EndQueue();
+    std::lock_guard<std::mutex> lock(mutex_);
+    ending_ = true;
+    work_.notify_all();
+    for (const auto& queue : live_) queue->EndQueue();
   }
 
   void FinishEnding() {

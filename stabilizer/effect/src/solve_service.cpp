@@ -55,7 +55,14 @@ std::int32_t PopupOf(HX_ParamDef** params, ParamIndex index) {
 }  // namespace
 
 bool StabilizerEffect::ServiceAnalysis(bool from_render) {
-  if (const StabilizerState* const copy = GetState(); copy && copy->keep_jobs) return false;
+  if (const StabilizerState* const own = GetState()) {
+    if (own->keep_jobs) return false;
+    try {  // a block that could not be had when the instance came
+      AttachSharedData(true);
+    } catch (std::int32_t) {
+      ClearMessage(context());
+    }
+  }
   if (AnalysisEffect::ServiceAnalysis(from_render)) return true;
   StabilizerState* const state = GetState();
   if (!state) {

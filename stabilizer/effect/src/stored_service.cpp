@@ -95,13 +95,13 @@ void LoadInstance(const HostContext& context, FlattenedInstance kind, Stabilizer
 }
 
 // A job runs, or has results, in the process that began it alone.
-void KeepJobThatCanGoOn(StabilizerState& state) {
+void KeepJobThatCanGoOn(const HostContext& context, StabilizerState& state) {
   if (!state.analyzer || state.analyzer->job_stage() == analysis::JobStage::NotStarted) return;
   if (state.analyzer->CanGoOn()) {
     state.first_analysis = true;
     return;
   }
-  state.analyzer.reset();
+  state.EndAnalyzer(context.in, context.out);  // a failed job would keep its frames
   state.analysis_pending = false;
 }
 
@@ -158,7 +158,7 @@ void StabilizerEffect::ReloadInstance() {
     } catch (const analysis::StateDeserializationFailed&) {
       state = std::make_unique<StabilizerState>(in, false);
     }
-    KeepJobThatCanGoOn(*state);
+    KeepJobThatCanGoOn(context(), *state);
     state->unpublished = UntoldStatus(*state);
   }
   OwnedHandle live(*in.cb, AllocateInstanceHandle(kLivePayloadLength));
