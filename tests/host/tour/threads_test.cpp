@@ -195,13 +195,21 @@ class TourThreads : public PlayedPlugin {
     }
   }
 
+  // What a user does about effects that something went wrong with.
+  void Rouse() {
+    for (const auto& effect : session().effects()) {
+      effect->SetParam(kSmoothness, 30);  // a solve that failed is tried again
+    }
+    session().TickUntilSettled(2000ms);  // a status that could not be told keeps a host waiting
+    for (const auto& effect : session().effects()) {
+      if (!Enabled(*effect, kAnalyze)) continue;
+      EXPECT_TRUE(effect->Press(kAnalyze).ok());
+    }
+  }
+
   // The frames of an effect whose tracks are rounded, as they are in a saved one, anew solved.
   std::vector<std::shared_ptr<WorldBuffer>> FramesOf(Effect& effect) {
-    effect.SetParam(kSmoothness, 30);  // a solve that failed is tried again
-    Settle(effect);
-    if (Enabled(effect, kAnalyze)) {
-      EXPECT_TRUE(effect.Press(kAnalyze).ok());
-    }
+    effect.SetParam(kSmoothness, 30);
     EXPECT_EQ(Settle(effect), 8);
     SavedEffect saved;
     EXPECT_TRUE(effect.Save(&saved).ok());
@@ -295,6 +303,7 @@ TEST_F(TourThreads, ASoakLosesNothingAndLeavesNothing) {
         state.length = static_cast<std::int32_t>(kFrames);
       });
     }
+    Rouse();
     std::vector<Effect*> survivors;
     for (const auto& effect : session().effects()) survivors.push_back(effect.get());
     for (Effect* effect : survivors) {
