@@ -198,18 +198,23 @@ class TourThreads : public PlayedPlugin {
   // What a user does about effects that something went wrong with.
   void Rouse() {
     for (const auto& effect : session().effects()) {
-      effect->SetParam(kSmoothness, 30);  // a solve that failed is tried again
+      effect->SetParam(kSmoothness, 29);  // a solve that failed is tried again
     }
     session().TickUntilSettled(2000ms);  // a status that could not be told keeps a host waiting
     for (const auto& effect : session().effects()) {
-      if (!Enabled(*effect, kAnalyze)) continue;
-      EXPECT_TRUE(effect->Press(kAnalyze).ok());
+      if (Enabled(*effect, kAnalyze)) {
+        EXPECT_TRUE(effect->Press(kAnalyze).ok());
+      }
     }
   }
 
   // The frames of an effect whose tracks are rounded, as they are in a saved one, anew solved.
   std::vector<std::shared_ptr<WorldBuffer>> FramesOf(Effect& effect) {
     effect.SetParam(kSmoothness, 30);
+    Settle(effect);
+    if (Enabled(effect, kAnalyze)) {  // what was under way was of another range
+      EXPECT_TRUE(effect.Press(kAnalyze).ok());
+    }
     EXPECT_EQ(Settle(effect), 8);
     SavedEffect saved;
     EXPECT_TRUE(effect.Save(&saved).ok());
