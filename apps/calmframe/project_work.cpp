@@ -36,10 +36,14 @@ std::unique_ptr<SteadyClip> OpenSaved(const std::string& path, const ControlFlag
 void KeepApart(const std::string& output, const std::vector<std::string>& inputs) {
   for (const std::string& input : inputs) {
     if (input.empty()) continue;
-    std::error_code unknown;
-    if (std::filesystem::equivalent(output, input, unknown) ||
-        std::filesystem::weakly_canonical(output, unknown) ==
-            std::filesystem::weakly_canonical(input, unknown)) {
+    std::error_code unknown, input_unknown;
+    bool same = std::filesystem::equivalent(output, input, unknown);
+    if (!same) {  // one that is not there yet, such as a project to be made
+      const auto place = std::filesystem::weakly_canonical(output, unknown);
+      same = place == std::filesystem::weakly_canonical(input, input_unknown) && !unknown &&
+             !input_unknown;
+    }
+    if (same) {
       throw media::Failure(media::Failure::Side::output, output + ": is an input itself");
     }
   }

@@ -20,6 +20,8 @@
 #include "apps/report/page.h"
 #include "apps/report/picture.h"
 #include "host/media/output_file.h"
+#include "host/timeline/layer.h"
+#include "host/timeline/source.h"
 #include "platform/tessel/debug.h"
 #include "platform/tessel/threads.h"
 
@@ -166,14 +168,16 @@ void AddSolve(const SolvedClip& solved, const std::vector<double>& scores, repor
                         10,
                         true});
   if (std::any_of(scores.begin(), scores.end(), [](double s) { return std::isfinite(s); })) {
-    page.plots.push_back({"models",
-                          "Model scores",
-                          "",
-                          "What a frame's warp may do: 1 shift it, 2 turn and size it too, 3 "
-                          "perspective, 4 bend it; between two numbers a blend of both.",
-                          {{"score", scores}},
-                          4,
-                          true});
+    page.plots.push_back(
+        {"models",
+         "Model scores",
+         "",
+         "What a frame's warp may do: 1 shift it, 2 turn and size it too, 3 "
+         "perspective, 4 bend it; between two numbers a blend of both. As a solve of the "
+         "saved tracks tells them.",
+         {{"score", scores}},
+         4,
+         true});
     page.facts.push_back({"Warps", ModelsText(scores)});
   }
   if (!solved.window.empty()) {
@@ -230,11 +234,15 @@ std::vector<double> AddPictures(SteadyClip& clip, int threads, ProgressLine& pro
                    page.film[next++].after = DataUrlOf(ViewOf(pixels, aspect), kPictureWidth);
                  }
                });
-  host::WorldBuffer source(info.width, info.height, HX_FORMAT_ARGB8);
-  const std::unique_ptr<media::ClipReader> reader = media::ClipReader::Open(clip.path());
+  // From the source that has drawn the frames: another reader would search the file for them again.
+  const host::SourcePtr source = clip.effect().shared()->layer()->state()->source;
   for (report::FilmFrame& moment : page.film) {
-    reader->Read(moment.frame, source.row<HX_Pixel8>(0), source.world().row_bytes);
-    moment.before = DataUrlOf(ViewOf(source, aspect), kPictureWidth);
+    const host::PicturePtr shot =
+        source->Fetch(static_cast<std::int64_t>(moment.frame), host::PixelKind::argb8);
+    if (!shot) continue;
+    moment.before = report::DataUrlOf(
+        {shot->row<HX_Pixel8>(0), shot->row_bytes(), shot->width(), shot->height(), aspect},
+        kPictureWidth);
   }
   return empty;
 }
