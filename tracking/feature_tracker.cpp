@@ -131,14 +131,30 @@ void FeatureTracker::TrackFeatures(const ImagePyramid& previous, const ImagePyra
                                    tracking_feature<float>* current_row, std::size_t feature_count,
                                    TrackingStatistics& statistics) {
   for (std::size_t s = 0; s < feature_count; ++s) {
-    if (previous_row[s].status < 0) {
-      current_row[s].status = feature_status::kEmpty;
-    } else if (TrackFeature(previous, current, previous_row[s], current_row[s], statistics)) {
-      current_row[s].status = feature_status::kTracked;
-    } else {
-      current_row[s].status = feature_status::kLost;
-      Count(statistics.translation, 0);
-    }
+    TrackSlot(previous, current, previous_row[s], current_row[s], statistics);
+  }
+}
+
+void FeatureTracker::TrackAndVerify(const ImagePyramid& previous, const ImagePyramid& current,
+                                    const tracking_feature<float>* previous_row,
+                                    tracking_feature<float>* current_row, std::size_t feature_count,
+                                    TrackingStatistics& statistics) {
+  for (std::size_t s = 0; s < feature_count; ++s) {
+    TrackSlot(previous, current, previous_row[s], current_row[s], statistics);
+    if (verification_) VerifySlot(current, slots_[s], current_row[s], statistics);
+  }
+}
+
+void FeatureTracker::TrackSlot(const ImagePyramid& previous, const ImagePyramid& current,
+                               const tracking_feature<float>& from, tracking_feature<float>& to,
+                               TrackingStatistics& statistics) {
+  if (from.status < 0) {
+    to.status = feature_status::kEmpty;
+  } else if (TrackFeature(previous, current, from, to, statistics)) {
+    to.status = feature_status::kTracked;
+  } else {
+    to.status = feature_status::kLost;
+    Count(statistics.translation, 0);
   }
 }
 
@@ -185,17 +201,20 @@ void FeatureTracker::InitialiseSeeds(const ImagePyramid& current,
 void FeatureTracker::VerifyFeatures(const ImagePyramid& current, tracking_feature<float>* row,
                                     TrackingStatistics& statistics) {
   for (std::size_t s = 0; s < slots_.size(); ++s) {
-    tracking_feature<float>& cell = row[s];
-    if (cell.status != feature_status::kTracked) continue;
-    feature_slot& slot = slots_[s];
-    slot.state.dx = cell.x - slot.state.x;
-    slot.state.dy = cell.y - slot.state.y;
-    const float limit = slot.primary_channel != 0 ? kAnyCorrelation : min_correlation_;
-    if (VerifyFeature(current, slot, limit, cell, statistics)) continue;
-    cell.status =
-        limit > cell.correlation ? feature_status::kRejectedCorrelation : feature_status::kRejected;
-    Count(statistics.verification, 0);
+    VerifySlot(current, slots_[s], row[s], statistics);
   }
+}
+
+void FeatureTracker::VerifySlot(const ImagePyramid& current, feature_slot& slot,
+                                tracking_feature<float>& cell, TrackingStatistics& statistics) {
+  if (cell.status != feature_status::kTracked) return;
+  slot.state.dx = cell.x - slot.state.x;
+  slot.state.dy = cell.y - slot.state.y;
+  const float limit = slot.primary_channel != 0 ? kAnyCorrelation : min_correlation_;
+  if (VerifyFeature(current, slot, limit, cell, statistics)) return;
+  cell.status =
+      limit > cell.correlation ? feature_status::kRejectedCorrelation : feature_status::kRejected;
+  Count(statistics.verification, 0);
 }
 
 bool FeatureTracker::VerifyFeature(const ImagePyramid& current, feature_slot& slot, float limit,

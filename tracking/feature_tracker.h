@@ -41,6 +41,13 @@ class FeatureTracker {
   void VerifyFeatures(const ImagePyramid& current, tracking_feature<float>* row,
                       TrackingStatistics& statistics);
 
+  // TrackFeatures and VerifyFeatures in one walk over the slots, with the same outcome: a feature's
+  // second match finds the pixels of its first one in the cache.
+  void TrackAndVerify(const ImagePyramid& previous, const ImagePyramid& current,
+                      const tracking_feature<float>* previous_row,
+                      tracking_feature<float>* current_row, std::size_t feature_count,
+                      TrackingStatistics& statistics);
+
   const AffineState& state(std::size_t slot) const { return slots_[slot].state; }
 
  private:
@@ -61,6 +68,11 @@ class FeatureTracker {
   struct translation_stage;
   struct affine_stage;
 
+  void TrackSlot(const ImagePyramid& previous, const ImagePyramid& current,
+                 const tracking_feature<float>& from, tracking_feature<float>& to,
+                 TrackingStatistics& statistics);
+  void VerifySlot(const ImagePyramid& current, feature_slot& slot, tracking_feature<float>& cell,
+                  TrackingStatistics& statistics);
   bool TrackFeature(const ImagePyramid& previous, const ImagePyramid& current,
                     const tracking_feature<float>& from, tracking_feature<float>& to,
                     TrackingStatistics& statistics);

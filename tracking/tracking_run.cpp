@@ -62,8 +62,7 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
       selector.SelectFirst();
     } else {
       source.LoadColorPyramid(t, current, scratch);
-      tracker.TrackFeatures(previous, current, row - feature_count, row, feature_count, frame);
-      tracker.VerifyFeatures(current, row, frame);
+      tracker.TrackAndVerify(previous, current, row - feature_count, row, feature_count, frame);
       load_candidates();
       const auto free_slots = static_cast<std::size_t>(std::count_if(
           row, row + feature_count, [](const auto& cell) { return cell.status < 0; }));
