@@ -219,11 +219,10 @@ struct Step {
     for (const auto& seed : seeds) {
       if (seed.status > 0) points.emplace_back(seed.x, seed.y);
     }
-    std::vector<float> scratch;
     for (std::size_t f = 0; f < 2; ++f) {
       pyramids.emplace_back(in.width, in.height, std::size_t{3}, kLevels);
       ColorFromArgb(in.Argb(f), pyramids[f].LevelData(0));
-      BuildLevels(pyramids[f], scratch);
+      BuildLevels(pyramids[f]);
     }
     statistics.translation.resize(kLevels + 1);
     statistics.verification.resize(kLevels + 1);

@@ -77,8 +77,7 @@ struct Clip {
   static ImagePyramid Pyramid(const cv::Mat& bytes) {
     ImagePyramid pyramid(bytes.cols, bytes.rows, 3, 5);
     bytes.convertTo(cv::Mat(bytes.size(), CV_32FC3, pyramid.LevelData(0)), CV_32FC3);
-    std::vector<float> scratch;
-    BuildLevels(pyramid, scratch);
+    BuildLevels(pyramid);
     return pyramid;
   }
 
@@ -159,9 +158,8 @@ void TrackingStep(benchmark::State& state) {
   FeatureTracker tracker(clip.params, clip.seeds.size(), 3);
   tracker.InitialiseSeeds(clip.previous, clip.seeds.data());
   std::vector<tracking_feature<float>> row(clip.seeds.size());
-  std::vector<float> scratch;
   for (auto _ : state) {
-    BuildLevels(clip.current, scratch);
+    BuildLevels(clip.current);
     clip.Translate(tracker, row);
     tracker.VerifyFeatures(clip.current, row.data(), clip.statistics);
   }

@@ -44,15 +44,14 @@ constexpr std::size_t kChannels = 3;
 constexpr std::size_t kStreamedBytes = std::size_t{8} << 20;
 
 // `row` is row y of `level`: makes the row under it of the next level, and what depends on that.
-void ReduceOnwards(ImagePyramid& pyramid, std::size_t level, std::size_t y, const float* row,
-                   float* scratch) {
+void ReduceOnwards(ImagePyramid& pyramid, std::size_t level, std::size_t y, const float* row) {
   while (level + 1 < pyramid.levels && y % 2 == 0) {
     const std::size_t width = pyramid.LevelWidth(level);
     ++level;
     y /= 2;
     if (y == 0 || y + 1 >= pyramid.LevelHeight(level)) return;
     float* reduced = pyramid.LevelData(level) + y * pyramid.LevelWidth(level) * kChannels;
-    ReduceRow(row, width, kChannels, reduced, scratch);
+    ReduceRow(row, width, kChannels, reduced);
     row = reduced;
   }
 }
@@ -64,11 +63,11 @@ void ColorPyramidFromArgb(const ArgbFrame& frame, ImagePyramid& pyramid,
   const std::size_t deepest = std::max<std::size_t>(pyramid.levels, 1) - 1;
   if (pyramid.LevelWidth(deepest) < 3 || pyramid.LevelHeight(deepest) < 3) {
     ColorFromArgb(frame, pyramid.LevelData(0));
-    BuildLevels(pyramid, scratch);
+    BuildLevels(pyramid);
     return;
   }
   const std::size_t samples = frame.width * kChannels;
-  scratch.resize(std::max(scratch.size(), 2 * samples));
+  scratch.resize(std::max(scratch.size(), samples));
   const bool streamed = samples * frame.height * sizeof(float) > kStreamedBytes;
   for (std::size_t y = 0; y < frame.height; ++y) {
     const ArgbFrame line{frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes,
@@ -77,7 +76,7 @@ void ColorPyramidFromArgb(const ArgbFrame& frame, ImagePyramid& pyramid,
     float* row = streamed ? scratch.data() : level0;
     ColorFromArgb(line, row);
     if (streamed) HWY_DYNAMIC_DISPATCH(StreamRow)(row, samples, level0);
-    ReduceOnwards(pyramid, 0, y, row, scratch.data() + samples);
+    ReduceOnwards(pyramid, 0, y, row);
   }
   if (streamed) hwy::FlushStream();
   for (std::size_t l = 1; l < pyramid.levels; ++l) {

@@ -26,9 +26,9 @@ class FrameSource {
   // The whole pyramid of a frame, of three channels: what the loop calls for LoadColor. A source
   // that has the frame's pixels at hand makes it in one pass.
   virtual void LoadColorPyramid(std::size_t frame_index, ImagePyramid& pyramid,
-                                std::vector<float>& scratch) {
+                                std::vector<float>& /*scratch*/) {
     LoadColor(frame_index, pyramid.LevelData(0));
-    BuildLevels(pyramid, scratch);
+    BuildLevels(pyramid);
   }
 };
 

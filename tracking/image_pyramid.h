@@ -31,9 +31,8 @@ class ImagePyramid {
   std::vector<std::size_t> level_starts_;
 };
 
-// Fills levels 1 to levels - 1 from level 0 by ReduceLevel. scratch is grown at the first call and
-// used again.
-void BuildLevels(ImagePyramid& pyramid, std::vector<float>& scratch);
+// Fills levels 1 to levels - 1 from level 0 by ReduceLevel.
+void BuildLevels(ImagePyramid& pyramid);
 
 // Reduces `source`, width by height pixels, to `destination`, (width + 1) / 2 by (height + 1) / 2.
 // Each row that is kept (every other one) is smoothed along x by (1 2 1) / 4; there is no filter
@@ -41,11 +40,10 @@ void BuildLevels(ImagePyramid& pyramid, std::vector<float>& scratch);
 // destination's first row and leaves the rest as it was. channels is 1, 3 or 4; with any other
 // count the destination gets its black frame only. The images may not overlap.
 void ReduceLevel(const float* source, std::size_t width, std::size_t height, std::size_t channels,
-                 float* destination, std::vector<float>& scratch);
+                 float* destination);
 
 // One of the destination's rows but the first and the last, from the source's row over it, which
-// has `width` pixels, at least 3. scratch has as many samples.
-void ReduceRow(const float* source, std::size_t width, std::size_t channels, float* destination,
-               float* scratch);
+// has `width` pixels, at least 3.
+void ReduceRow(const float* source, std::size_t width, std::size_t channels, float* destination);
 
 }  // namespace marrow::tracking

@@ -26,7 +26,7 @@ TEST(ColorPyramidTest, EqualsConversionAndLevelsApart) {
       expected.data = pyramid.data;
       std::vector<float> scratch;
       ColorFromArgb(frame, expected.LevelData(0));
-      BuildLevels(expected, scratch);
+      BuildLevels(expected);
       ColorPyramidFromArgb(frame, pyramid, scratch);
       ASSERT_TRUE(pyramid.data == expected.data) << w << "x" << h << ", " << levels;
     }

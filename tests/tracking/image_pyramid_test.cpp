@@ -61,8 +61,8 @@ TEST(ReduceLevelTest, SmoothsAlongXOnlyInsideABlackFrame) {
   for (int y = 0; y < 5; ++y) {
     for (int x = 0; x < 7; ++x) image.push_back(10.0f * y + x * x);
   }
-  std::vector<float> reduced(12, kUntouched), scratch;
-  ReduceLevel(image.data(), 7, 5, 1, reduced.data(), scratch);
+  std::vector<float> reduced(12, kUntouched);
+  ReduceLevel(image.data(), 7, 5, 1, reduced.data());
   EXPECT_THAT(reduced, ElementsAre(0, 0, 0, 0, 0, 24.5f, 36.5f, 0, 0, 0, 0, 0));
 }
 
@@ -74,8 +74,8 @@ TEST(ReduceLevelTest, EqualsThePlainLoopsAtEverySizeAboutAVector) {
         std::vector<float> image = RandomImage(w * h * channels);
         const std::vector<float> expected = PlainReduction(image, w, h, channels);
         image.resize(image.size() + 64, std::numeric_limits<float>::quiet_NaN());
-        std::vector<float> reduced(expected.size() + 64, kUntouched), scratch;
-        ReduceLevel(image.data(), w, h, channels, reduced.data(), scratch);
+        std::vector<float> reduced(expected.size() + 64, kUntouched);
+        ReduceLevel(image.data(), w, h, channels, reduced.data());
         const std::vector<float> behind(reduced.begin() + expected.size(), reduced.end());
         reduced.resize(expected.size());
         ASSERT_EQ(reduced, expected) << w << "x" << h << "x" << channels;
@@ -87,19 +87,19 @@ TEST(ReduceLevelTest, EqualsThePlainLoopsAtEverySizeAboutAVector) {
 
 TEST(ReduceLevelTest, ASourceUnderThreePixelsClearsTheFirstRowOnly) {
   const std::vector<float> image(2 * 8, 5.0f);
-  std::vector<float> reduced(8, kUntouched), scratch;
-  ReduceLevel(image.data(), 2, 8, 1, reduced.data(), scratch);
+  std::vector<float> reduced(8, kUntouched);
+  ReduceLevel(image.data(), 2, 8, 1, reduced.data());
   EXPECT_THAT(reduced, ElementsAre(0, kUntouched, kUntouched, kUntouched, kUntouched, kUntouched,
                                    kUntouched, kUntouched));
   reduced.assign(8, kUntouched);
-  ReduceLevel(image.data(), 8, 2, 1, reduced.data(), scratch);
+  ReduceLevel(image.data(), 8, 2, 1, reduced.data());
   EXPECT_THAT(reduced, ElementsAre(0, 0, 0, 0, kUntouched, kUntouched, kUntouched, kUntouched));
 }
 
 TEST(ReduceLevelTest, TwoChannelsGetTheFrameOnly) {
   const std::vector<float> image(6 * 6 * 2, 5.0f);
-  std::vector<float> reduced(3 * 3 * 2, kUntouched), scratch;
-  ReduceLevel(image.data(), 6, 6, 2, reduced.data(), scratch);
+  std::vector<float> reduced(3 * 3 * 2, kUntouched);
+  ReduceLevel(image.data(), 6, 6, 2, reduced.data());
   std::vector<float> expected(18, 0.0f);
   expected[8] = expected[9] = kUntouched;
   EXPECT_EQ(reduced, expected);
@@ -107,9 +107,9 @@ TEST(ReduceLevelTest, TwoChannelsGetTheFrameOnly) {
 
 TEST(BuildLevelsTest, EachLevelReducesTheOneBefore) {
   ImagePyramid pyramid(61, 50, 3, 4);
-  std::vector<float> level = RandomImage(61 * 50 * 3), scratch;
+  std::vector<float> level = RandomImage(61 * 50 * 3);
   std::copy(level.begin(), level.end(), pyramid.LevelData(0));
-  BuildLevels(pyramid, scratch);
+  BuildLevels(pyramid);
   for (std::size_t l = 1; l < 4; ++l) {
     level = PlainReduction(level, pyramid.LevelWidth(l - 1), pyramid.LevelHeight(l - 1), 3);
     EXPECT_EQ(std::vector<float>(pyramid.LevelData(l), pyramid.LevelData(l) + level.size()), level);
@@ -117,16 +117,15 @@ TEST(BuildLevelsTest, EachLevelReducesTheOneBefore) {
 }
 
 TEST(BuildLevelsTest, OneLevelOrATinyImageStaysAsItIs) {
-  std::vector<float> scratch;
   for (const std::size_t levels : {0, 1}) {
     ImagePyramid pyramid(9, 9, 3, levels);
     std::fill(pyramid.data.begin(), pyramid.data.end(), 3.0f);
-    BuildLevels(pyramid, scratch);
+    BuildLevels(pyramid);
     EXPECT_THAT(pyramid.data, Each(3.0f));
   }
   ImagePyramid pixel(1, 1, 3, 5);
   std::fill_n(pixel.data.begin(), 3, 3.0f);
-  BuildLevels(pixel, scratch);
+  BuildLevels(pixel);
   EXPECT_EQ(pixel.data.size(), 15u);
   EXPECT_EQ(pixel.data[2], 3.0f);
   EXPECT_EQ(pixel.data[3], 0.0f);

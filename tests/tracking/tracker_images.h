@@ -32,8 +32,7 @@ ImagePyramid Picture(std::size_t width, std::size_t height, std::size_t channels
       }
     }
   }
-  std::vector<float> scratch;
-  BuildLevels(pyramid, scratch);
+  BuildLevels(pyramid);
   return pyramid;
 }
 
