@@ -125,6 +125,9 @@ class MemorySource final : public FrameSource {
   void LoadLuma(std::size_t t, float* out) override { LumaFromArgb(Frame(t), out); }
   void LoadMask(std::size_t t, std::uint8_t* out) override { MaskFromArgb(Frame(t), out); }
   void LoadColor(std::size_t t, float* out) override { ColorFromArgb(Frame(t), out); }
+  ImagePyramid::first_level first_level() const override {
+    return ImagePyramid::first_level::bytes;
+  }
   void LoadColorPyramid(std::size_t t, ImagePyramid& pyramid,
                         std::vector<float>& scratch) override {
     ColorPyramidFromArgb(Frame(t), pyramid, scratch);
@@ -165,7 +168,7 @@ void Preparation(benchmark::State& state) {
   const Frames& in = Input();
   std::vector<float> luma(in.width * in.height), scratch;
   std::vector<std::uint8_t> mask(in.width * in.height);
-  ImagePyramid pyramid(in.width, in.height, 3, kLevels);
+  ImagePyramid pyramid(in.width, in.height, 3, kLevels, ImagePyramid::first_level::bytes);
   cv::Mat rgb, colour, single;
   in.grey[0].convertTo(single, kPeerDepth);
   std::vector<cv::Mat> levels;
@@ -219,10 +222,11 @@ struct Step {
     for (const auto& seed : seeds) {
       if (seed.status > 0) points.emplace_back(seed.x, seed.y);
     }
+    std::vector<float> scratch;
     for (std::size_t f = 0; f < 2; ++f) {
-      pyramids.emplace_back(in.width, in.height, std::size_t{3}, kLevels);
-      ColorFromArgb(in.Argb(f), pyramids[f].LevelData(0));
-      BuildLevels(pyramids[f]);
+      pyramids.emplace_back(in.width, in.height, std::size_t{3}, kLevels,
+                            ImagePyramid::first_level::bytes);
+      ColorPyramidFromArgb(in.Argb(f), pyramids[f], scratch);
     }
     statistics.translation.resize(kLevels + 1);
     statistics.verification.resize(kLevels + 1);

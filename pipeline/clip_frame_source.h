@@ -22,6 +22,9 @@ class ClipFrameSource final : public marrow::tracking::FrameSource {
   void LoadLuma(std::size_t picture, float* destination) override;
   void LoadMask(std::size_t picture, std::uint8_t* destination) override;
   void LoadColor(std::size_t picture, float* destination) override;
+  marrow::tracking::ImagePyramid::first_level first_level() const override {
+    return marrow::tracking::ImagePyramid::first_level::bytes;
+  }
   void LoadColorPyramid(std::size_t picture, marrow::tracking::ImagePyramid& pyramid,
                         std::vector<float>& scratch) override;
 

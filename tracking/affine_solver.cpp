@@ -25,7 +25,9 @@ bool SampleWarped(const level_image& image, const window_shape& shape, const Aff
                                 state.c,
                                 1.0f + state.d};
   if (!kernels::AffineWindowInside(warp, shape, image.width, image.height)) return false;
-  kernels::SampleAffine(image.data, image.width, image.height, warp, shape, window);
+  image.WithSamples([&](const auto* samples) {
+    kernels::SampleAffine(samples, image.width, image.height, warp, shape, window);
+  });
   return true;
 }
 

@@ -7,9 +7,9 @@
 
 namespace marrow::tracking {
 
-// ColorFromArgb to level 0 and BuildLevels in one pass over the frame, with the same result: a row
-// is reduced while it is in the cache, and a large level 0 goes past the cache to memory. The
-// pyramid has three channels and the frame's size.
+// Fills a pyramid that starts with bytes, of three channels and the frame's size, in one pass over
+// the frame: a row is reduced while it is in the cache. Its levels of floats are those that
+// BuildLevels makes of ColorFromArgb.
 void ColorPyramidFromArgb(const ArgbFrame& frame, ImagePyramid& pyramid,
                           std::vector<float>& scratch);
 

@@ -9,10 +9,6 @@
 namespace marrow::tracking {
 namespace {
 
-level_image LevelOf(const ImagePyramid& pyramid, std::size_t level) {
-  return {pyramid.LevelData(level), pyramid.LevelWidth(level), pyramid.LevelHeight(level)};
-}
-
 void Count(std::vector<std::size_t>& histogram, std::size_t counter) {
   if (counter < histogram.size()) ++histogram[counter];
 }
@@ -50,7 +46,7 @@ struct FeatureTracker::translation_stage {
     }
     if (singular) return kLevelFailed;
     return SolveTranslation(planes, tracker.shape_, tracker.translation_normal_,
-                            LevelOf(current, level), mode, tracker.tolerances_,
+                            current.Level(level), mode, tracker.tolerances_,
                             tracker.max_iterations_, state, tracker.window_.data());
   }
 
@@ -78,7 +74,7 @@ struct FeatureTracker::affine_stage {
     }
     if (cached.normal_state == readiness::singular) return kLevelFailed;
     return SolveAffine(planes, tracker.offsets(), tracker.shape_, cached.normal,
-                       LevelOf(current, level), mode, tracker.tolerances_, tracker.max_iterations_,
+                       current.Level(level), mode, tracker.tolerances_, tracker.max_iterations_,
                        state, tracker.window_.data());
   }
 

@@ -88,39 +88,12 @@ void MaskRows(const ArgbFrame& frame, std::uint8_t* mask) {
   }
 }
 
-#if HWY_MAX_BYTES >= 32
-// Of four pixels: their twelve colours, in order, and four floats of no meaning behind them.
-template <class D>
-HWY_INLINE void StoreColorsOfFour(D df, const std::uint8_t* pixels, float* color) {
-  const hn::RebindToSigned<D> di;
-  const hn::Full128<std::uint8_t> bytes;
-  HWY_ALIGN static constexpr std::uint8_t kColors[16] = {1,  2,  3,  5,  6, 7, 9, 10,
-                                                         11, 13, 14, 15, 0, 0, 0, 0};
-  const auto colors = hn::TableLookupBytes(hn::LoadU(bytes, pixels), hn::Load(bytes, kColors));
-  if constexpr (hn::MaxLanes(D()) == 16) {
-    hn::StoreU(hn::ConvertTo(df, hn::PromoteTo(di, colors)), df, color);
-  } else {
-    const hn::Half<decltype(bytes)> half;
-    hn::StoreU(hn::ConvertTo(df, hn::PromoteTo(di, hn::LowerHalf(half, colors))), df, color);
-    hn::StoreU(hn::ConvertTo(df, hn::PromoteTo(di, hn::UpperHalf(half, colors))), df, color + 8);
-  }
-}
-#endif
-
 void ColorRows(const ArgbFrame& frame, float* color) {
   const Floats df;
   const std::size_t N = hn::Lanes(df);
   for (std::size_t y = 0; y < frame.height; ++y, color += 3 * frame.width) {
     const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
     std::size_t x = 0;
-#if HWY_MAX_BYTES >= 32
-    // What is stored too much is the next pixels' place; the last ones are left to the loops below.
-    const hn::CappedTag<float, 16> capped;
-    for (; x + 6 <= frame.width; x += 4) {
-      hwy::Prefetch(row + 4 * x + kBytesAhead);
-      StoreColorsOfFour(capped, row + 4 * x, color + 3 * x);
-    }
-#endif
     for (; x + N <= frame.width; x += N) {
       const auto pixels = LoadPixels(row, x);
       hn::StoreInterleaved3(hn::ConvertTo(df, Red(pixels)), hn::ConvertTo(df, Green(pixels)),
@@ -130,6 +103,49 @@ void ColorRows(const ArgbFrame& frame, float* color) {
       for (std::size_t c = 0; c < 3; ++c) color[3 * x + c] = row[4 * x + 1 + c];
     }
   }
+}
+
+void ColorByteRows(const ArgbFrame& frame, std::uint8_t* color) {
+  for (std::size_t y = 0; y < frame.height; ++y, color += 3 * frame.width) {
+    const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
+    std::size_t x = 0;
+#if HWY_TARGET != HWY_SCALAR
+    // Colours go together in each block of four pixels, then the blocks' 12 bytes. What is stored
+    // too much is the next pixels' place.
+    const hn::ScalableTag<std::uint8_t> d;
+    const hn::Repartition<std::uint32_t, decltype(d)> words;
+    const std::size_t N = hn::Lanes(d);
+    HWY_ALIGN static constexpr std::uint8_t kColors[16] = {1,  2,  3,  5,  6, 7, 9, 10,
+                                                           11, 13, 14, 15, 0, 0, 0, 0};
+    const auto colors = hn::LoadDup128(d, kColors);
+    HWY_ALIGN std::int32_t places[hn::MaxLanes(words)];
+    for (std::size_t j = 0; j < N / 4; ++j) {
+      places[j] = static_cast<std::int32_t>(j < N / 16 * 3 ? j / 3 * 4 + j % 3 : 0);
+    }
+    const auto together = hn::SetTableIndices(words, places);
+    for (; 3 * x + N <= 3 * frame.width; x += N / 4) {
+      hwy::Prefetch(row + 4 * x + kBytesAhead);
+      const auto blocks = hn::TableLookupBytes(hn::LoadU(d, row + 4 * x), colors);
+      const auto packed = hn::TableLookupLanes(hn::BitCast(words, blocks), together);
+      hn::StoreU(hn::BitCast(d, packed), d, color + 3 * x);
+    }
+#endif
+    for (; x < frame.width; ++x) {
+      for (std::size_t c = 0; c < 3; ++c) color[3 * x + c] = row[4 * x + 1 + c];
+    }
+  }
+}
+
+void WidenBytes(const std::uint8_t* bytes, std::size_t count, float* floats) {
+  const Floats d;
+  const Pixels di;
+  const hn::Rebind<std::uint8_t, Floats> d8;
+  const std::size_t N = hn::Lanes(d);
+  std::size_t i = 0;
+  for (; i + N <= count; i += N) {
+    hn::StoreU(hn::ConvertTo(d, hn::PromoteTo(di, hn::LoadU(d8, bytes + i))), d, floats + i);
+  }
+  for (; i < count; ++i) floats[i] = bytes[i];
 }
 
 }  // namespace HWY_NAMESPACE
@@ -142,6 +158,8 @@ namespace marrow::tracking {
 HWY_EXPORT(LumaRows);
 HWY_EXPORT(MaskRows);
 HWY_EXPORT(ColorRows);
+HWY_EXPORT(ColorByteRows);
+HWY_EXPORT(WidenBytes);
 
 void LumaFromArgb(const ArgbFrame& frame, float* luma) {
   HWY_DYNAMIC_DISPATCH(LumaRows)(frame, luma);
@@ -153,6 +171,14 @@ void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask) {
 
 void ColorFromArgb(const ArgbFrame& frame, float* color) {
   HWY_DYNAMIC_DISPATCH(ColorRows)(frame, color);
+}
+
+void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color) {
+  HWY_DYNAMIC_DISPATCH(ColorByteRows)(frame, color);
+}
+
+void FloatsFromBytes(const std::uint8_t* bytes, std::size_t count, float* floats) {
+  HWY_DYNAMIC_DISPATCH(WidenBytes)(bytes, count, floats);
 }
 
 }  // namespace marrow::tracking

@@ -22,7 +22,11 @@ void LumaFromArgb(const ArgbFrame& frame, float* luma);
 // width * height bytes: 1 where alpha is above 127, else 0.
 void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask);
 
-// width * height * 3 floats: red, green, blue from 0 to 255, interleaved, whatever alpha is.
+// width * height * 3 floats or bytes: red, green, blue from 0 to 255, interleaved, whatever alpha
+// is.
 void ColorFromArgb(const ArgbFrame& frame, float* color);
+void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color);
+
+void FloatsFromBytes(const std::uint8_t* bytes, std::size_t count, float* floats);
 
 }  // namespace marrow::tracking

@@ -23,8 +23,12 @@ class FrameSource {
   virtual void LoadMask(std::size_t frame_index, std::uint8_t* destination) = 0;
   // Red, green, blue 0 to 255, interleaved, width * height * 3 floats: level 0 of a pyramid.
   virtual void LoadColor(std::size_t frame_index, float* destination) = 0;
+  // How the pyramids that the loop hands to LoadColorPyramid begin.
+  virtual ImagePyramid::first_level first_level() const {
+    return ImagePyramid::first_level::floats;
+  }
   // The whole pyramid of a frame, of three channels: what the loop calls for LoadColor. A source
-  // that has the frame's pixels at hand makes it in one pass.
+  // that has the frame's pixels at hand makes it in one pass, and of bytes.
   virtual void LoadColorPyramid(std::size_t frame_index, ImagePyramid& pyramid,
                                 std::vector<float>& /*scratch*/) {
     LoadColor(frame_index, pyramid.LevelData(0));

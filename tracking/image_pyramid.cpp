@@ -101,12 +101,17 @@ std::size_t CeilOfHalvings(std::size_t length, std::size_t level) {
 }  // namespace
 
 ImagePyramid::ImagePyramid(std::size_t level0_width, std::size_t level0_height,
-                           std::size_t channel_count, std::size_t level_count)
+                           std::size_t channel_count, std::size_t level_count, first_level first)
     : width(level0_width), height(level0_height), channels(channel_count), levels(level_count) {
   std::size_t size = 0;
   for (std::size_t l = 0; l < std::max<std::size_t>(levels, 1); ++l) {
     level_starts_.push_back(size);
-    size += channels * LevelWidth(l) * LevelHeight(l);
+    const std::size_t samples = channels * LevelWidth(l) * LevelHeight(l);
+    if (l == 0 && first == first_level::bytes) {
+      memory::ResizeOnLargePages(bytes, samples);
+    } else {
+      size += samples;
+    }
   }
   memory::ResizeOnLargePages(data, size);
 }

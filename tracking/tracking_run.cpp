@@ -42,8 +42,8 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
   FeatureSelector selector(selector_params);
   selector.Configure(source.width(), source.height());
   FeatureTracker tracker(tracker_params, feature_count, kChannels);
-  ImagePyramid previous(source.width(), source.height(), kChannels, levels);
-  ImagePyramid current(source.width(), source.height(), kChannels, levels);
+  ImagePyramid previous(source.width(), source.height(), kChannels, levels, source.first_level());
+  ImagePyramid current(source.width(), source.height(), kChannels, levels, source.first_level());
   std::vector<float> scratch;
 
   for (std::size_t t = 0; t < frame_count; ++t) {

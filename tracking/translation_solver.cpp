@@ -21,10 +21,12 @@ bool SampleAt(const level_image& image, const window_shape& shape, const AffineS
         iy <= static_cast<double>(image.height) - half_y - 3.0)) {
     return false;
   }
-  kernels::SampleTranslated(image.data, image.width, shape.channels,
-                            static_cast<std::size_t>(ix) - shape.half_x,
-                            static_cast<std::size_t>(iy) - shape.half_y, static_cast<float>(x - ix),
-                            static_cast<float>(y - iy), shape.columns(), shape.rows(), window);
+  image.WithSamples([&](const auto* samples) {
+    kernels::SampleTranslated(
+        samples, image.width, shape.channels, static_cast<std::size_t>(ix) - shape.half_x,
+        static_cast<std::size_t>(iy) - shape.half_y, static_cast<float>(x - ix),
+        static_cast<float>(y - iy), shape.columns(), shape.rows(), window);
+  });
   return true;
 }
 

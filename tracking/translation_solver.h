@@ -1,17 +1,11 @@
 #pragma once
 
 #include "tracking/affine_state.h"
+#include "tracking/image_pyramid.h"
 #include "tracking/packed_cholesky.h"
 #include "tracking/window_kernels.h"
 
 namespace marrow::tracking {
-
-// A pyramid level as the solvers see it.
-struct level_image {
-  const float* data;
-  std::size_t width;
-  std::size_t height;
-};
 
 // Inverse of the normal matrix of one template level, sum of J'J with J = (Gx / 2, Gy / 2) and in
 // the joint mode T and 1 for each channel.

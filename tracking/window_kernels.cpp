@@ -90,29 +90,41 @@ HWY_INLINE void ForEachVector(std::size_t samples, Step step) {
 }
 
 template <class D>
-HWY_INLINE void SampleStrip(D d, const float* in, std::size_t in_stride, std::size_t channels,
-                            float fx, float fy, std::size_t rows, float* out,
-                            std::size_t out_stride) {
+HWY_INLINE hn::Vec<D> LoadSamples(D d, const float* samples) {
+  return hn::LoadU(d, samples);
+}
+
+template <class D>
+HWY_INLINE hn::Vec<D> LoadSamples(D d, const std::uint8_t* samples) {
+  const hn::Rebind<std::uint8_t, D> bytes;
+  const hn::RebindToSigned<D> di;
+  return hn::ConvertTo(d, hn::PromoteTo(di, hn::LoadU(bytes, samples)));
+}
+
+template <class D, class T>
+HWY_INLINE void SampleStrip(D d, const T* in, std::size_t in_stride, std::size_t channels, float fx,
+                            float fy, std::size_t rows, float* out, std::size_t out_stride) {
   const auto wx = hn::Set(d, fx);
   const auto wy = hn::Set(d, fy);
-  auto above = Lerp(hn::LoadU(d, in), hn::LoadU(d, in + channels), wx);
+  auto above = Lerp(LoadSamples(d, in), LoadSamples(d, in + channels), wx);
   for (std::size_t row = 0; row < rows; ++row) {
     in += in_stride;
-    const auto below = Lerp(hn::LoadU(d, in), hn::LoadU(d, in + channels), wx);
+    const auto below = Lerp(LoadSamples(d, in), LoadSamples(d, in + channels), wx);
     hn::StoreU(Lerp(above, below, wy), d, out);
     above = below;
     out += out_stride;
   }
 }
 
-void SampleTranslated(const float* image, std::size_t image_width, std::size_t channels,
-                      std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                      std::size_t rows, float* out) {
+template <class T>
+HWY_INLINE void SampleWindow(const T* image, std::size_t image_width, std::size_t channels,
+                             std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
+                             std::size_t rows, float* out) {
   const Lanes d;
   const std::size_t N = hn::Lanes(d);
   const std::size_t in_stride = image_width * channels;
   const std::size_t out_stride = columns * channels;
-  const float* in = image + y * in_stride + x * channels;
+  const T* in = image + y * in_stride + x * channels;
   if (out_stride < N) {
     for (std::size_t i = 0; i < out_stride; ++i) {
       SampleStrip(hn::CappedTag<float, 1>(), in + i, in_stride, channels, fx, fy, rows, out + i,
@@ -128,6 +140,18 @@ void SampleTranslated(const float* image, std::size_t image_width, std::size_t c
     i = out_stride - N;
     SampleStrip(d, in + i, in_stride, channels, fx, fy, rows, out + i, out_stride);
   }
+}
+
+void SampleTranslatedFloats(const float* image, std::size_t image_width, std::size_t channels,
+                            std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
+                            std::size_t rows, float* out) {
+  SampleWindow(image, image_width, channels, x, y, fx, fy, columns, rows, out);
+}
+
+void SampleTranslatedBytes(const std::uint8_t* image, std::size_t image_width, std::size_t channels,
+                           std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
+                           std::size_t rows, float* out) {
+  SampleWindow(image, image_width, channels, x, y, fx, fy, columns, rows, out);
 }
 
 template <class D>
@@ -164,15 +188,15 @@ void SplitGradients(const float* block, const window_shape& shape, float* t, flo
 }
 
 // One pixel: its channels from the four around it. `kWide` reads and writes four samples for three.
-template <std::size_t C, bool kWide>
-HWY_INLINE void SamplePixel(const float* in, std::size_t stride, float fx, float fy, float* out) {
+template <std::size_t C, bool kWide, class T>
+HWY_INLINE void SamplePixel(const T* in, std::size_t stride, float fx, float fy, float* out) {
   const hn::CappedTag<float, kWide ? 4 : 1> d;
   const auto wx = hn::Set(d, fx);
   const auto wy = hn::Set(d, fy);
   for (std::size_t c = 0; c < (kWide ? 1 : C); ++c) {
-    const float* p = in + c;
-    const auto above = Lerp(hn::LoadU(d, p), hn::LoadU(d, p + C), wx);
-    const auto below = Lerp(hn::LoadU(d, p + stride), hn::LoadU(d, p + stride + C), wx);
+    const T* p = in + c;
+    const auto above = Lerp(LoadSamples(d, p), LoadSamples(d, p + C), wx);
+    const auto below = Lerp(LoadSamples(d, p + stride), LoadSamples(d, p + stride + C), wx);
     hn::StoreU(Lerp(above, below, wy), d, out + c);
   }
 }
@@ -185,8 +209,8 @@ struct PixelPlaces {
   std::uint32_t jumps = 0;  // bit j: pixel j + 1 is not read right beside pixel j
 };
 
-template <std::size_t C, bool kWide>
-HWY_INLINE void SamplePixels(const float* origin, std::size_t stride, const PixelPlaces& places,
+template <std::size_t C, bool kWide, class T>
+HWY_INLINE void SamplePixels(const T* origin, std::size_t stride, const PixelPlaces& places,
                              std::size_t first, std::size_t end, float* out) {
   for (std::size_t j = first; j < end; ++j) {
     SamplePixel<C, kWide>(origin + places.offset[j], stride, places.fx[j], places.fy[j],
@@ -197,8 +221,8 @@ HWY_INLINE void SamplePixels(const float* origin, std::size_t stride, const Pixe
 // A warp is near the identity: most neighbours are read side by side, so that a vector of samples
 // comes in one piece, and each lane differs from a shift only by its pixel's fractions. kWide
 // allows to read a vector past a pixel's four, and to write as much past all rows but the last.
-template <std::size_t C, bool kWide>
-HWY_INLINE void SampleAffineRows(const float* image, std::size_t image_width,
+template <std::size_t C, bool kWide, class T>
+HWY_INLINE void SampleAffineRows(const T* image, std::size_t image_width,
                                  const affine_sampling& warp, const window_shape& shape,
                                  float* out) {
   const Lanes d;
@@ -209,8 +233,8 @@ HWY_INLINE void SampleAffineRows(const float* image, std::size_t image_width,
   const auto row_step = hn::Set(di, static_cast<std::int32_t>(stride));
   const auto m00 = hn::Set(d, warp.m00);
   const auto m10 = hn::Set(d, warp.m10);
-  const float* origin = image + warp.y * static_cast<std::ptrdiff_t>(stride) +
-                        warp.x * static_cast<std::ptrdiff_t>(C);
+  const T* origin = image + warp.y * static_cast<std::ptrdiff_t>(stride) +
+                    warp.x * static_cast<std::ptrdiff_t>(C);
   // Pixel of each sample of C vectors.
   HWY_ALIGN std::int32_t pixel_of[16 * C];
   for (std::size_t i = 0; i < C * N; ++i) pixel_of[i] = static_cast<std::int32_t>(i / C);
@@ -252,12 +276,12 @@ HWY_INLINE void SampleAffineRows(const float* image, std::size_t image_width,
             SamplePixels<C, kWide>(origin, stride, places, first, end, out);
             continue;
           }
-          const float* in = origin + places.offset[first] + (k * N - first * C);
+          const T* in = origin + places.offset[first] + (k * N - first * C);
           const auto pixel = hn::SetTableIndices(d, pixel_of + k * N);
           const auto wx = hn::TableLookupLanes(fx, pixel);
           const auto wy = hn::TableLookupLanes(fy, pixel);
-          const auto above = Lerp(hn::LoadU(d, in), hn::LoadU(d, in + C), wx);
-          const auto below = Lerp(hn::LoadU(d, in + stride), hn::LoadU(d, in + stride + C), wx);
+          const auto above = Lerp(LoadSamples(d, in), LoadSamples(d, in + C), wx);
+          const auto below = Lerp(LoadSamples(d, in + stride), LoadSamples(d, in + stride + C), wx);
           hn::StoreU(Lerp(above, below, wy), d, out + k * N);
         }
       }
@@ -290,8 +314,9 @@ bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
   return true;
 }
 
-void SampleAffine(const float* image, std::size_t image_width, std::size_t image_height,
-                  const affine_sampling& warp, const window_shape& shape, float* out) {
+template <class T>
+HWY_INLINE void SampleWarped(const T* image, std::size_t image_width, std::size_t image_height,
+                             const affine_sampling& warp, const window_shape& shape, float* out) {
   // Wide reads go on behind a pixel's right neighbour, which on the image's last row may lie behind
   // the image.
   const float reach = std::max(warp.m10, -warp.m10) * static_cast<float>(shape.half_x) +
@@ -308,6 +333,16 @@ void SampleAffine(const float* image, std::size_t image_width, std::size_t image
     }
     SampleAffineRows<C, false>(image, image_width, warp, shape, out);
   });
+}
+
+void SampleAffineFloats(const float* image, std::size_t image_width, std::size_t image_height,
+                        const affine_sampling& warp, const window_shape& shape, float* out) {
+  SampleWarped(image, image_width, image_height, warp, shape, out);
+}
+
+void SampleAffineBytes(const std::uint8_t* image, std::size_t image_width, std::size_t image_height,
+                       const affine_sampling& warp, const window_shape& shape, float* out) {
+  SampleWarped(image, image_width, image_height, warp, shape, out);
 }
 
 void GradientProducts(const template_planes& level, const window_shape& shape, double sums[3]) {
@@ -544,10 +579,12 @@ HWY_AFTER_NAMESPACE();
 #if HWY_ONCE
 namespace marrow::tracking {
 
-HWY_EXPORT(SampleTranslated);
+HWY_EXPORT(SampleTranslatedFloats);
+HWY_EXPORT(SampleTranslatedBytes);
 HWY_EXPORT(SplitGradients);
 HWY_EXPORT(AffineWindowInside);
-HWY_EXPORT(SampleAffine);
+HWY_EXPORT(SampleAffineFloats);
+HWY_EXPORT(SampleAffineBytes);
 HWY_EXPORT(GradientProducts);
 HWY_EXPORT(TranslationResidual);
 HWY_EXPORT(AffineResidual);
@@ -562,7 +599,14 @@ namespace kernels {
 void SampleTranslated(const float* image, std::size_t image_width, std::size_t channels,
                       std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
                       std::size_t rows, float* out) {
-  HWY_DYNAMIC_DISPATCH(SampleTranslated)
+  HWY_DYNAMIC_DISPATCH(SampleTranslatedFloats)
+  (image, image_width, channels, x, y, fx, fy, columns, rows, out);
+}
+
+void SampleTranslated(const std::uint8_t* image, std::size_t image_width, std::size_t channels,
+                      std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
+                      std::size_t rows, float* out) {
+  HWY_DYNAMIC_DISPATCH(SampleTranslatedBytes)
   (image, image_width, channels, x, y, fx, fy, columns, rows, out);
 }
 
@@ -577,7 +621,12 @@ bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
 
 void SampleAffine(const float* image, std::size_t image_width, std::size_t image_height,
                   const affine_sampling& warp, const window_shape& shape, float* out) {
-  HWY_DYNAMIC_DISPATCH(SampleAffine)(image, image_width, image_height, warp, shape, out);
+  HWY_DYNAMIC_DISPATCH(SampleAffineFloats)(image, image_width, image_height, warp, shape, out);
+}
+
+void SampleAffine(const std::uint8_t* image, std::size_t image_width, std::size_t image_height,
+                  const affine_sampling& warp, const window_shape& shape, float* out) {
+  HWY_DYNAMIC_DISPATCH(SampleAffineBytes)(image, image_width, image_height, warp, shape, out);
 }
 
 void GradientProducts(const template_planes& level, const window_shape& shape, double sums[3]) {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 
 // The loops over a tracking window's samples, vectorized by Highway with the instruction set chosen
 // at run time. A window is a plane of interleaved samples, row after row without gaps, followed by
@@ -65,8 +66,12 @@ struct template_products {
 namespace kernels {
 
 // Bilinear sample of columns x rows pixels whose first lies at (x + fx, y + fy), 0 <= f < 1. Reads
-// pixels x to x + columns and y to y + rows of the image, which must be inside it.
+// pixels x to x + columns and y to y + rows of the image, which must be inside it. Bytes give what
+// floats of their values give.
 void SampleTranslated(const float* image, std::size_t image_width, std::size_t channels,
+                      std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
+                      std::size_t rows, float* out);
+void SampleTranslated(const std::uint8_t* image, std::size_t image_width, std::size_t channels,
                       std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
                       std::size_t rows, float* out);
 
@@ -82,6 +87,8 @@ bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
 // Bilinear sample at the warped offsets of a window for which AffineWindowInside holds. One sample
 // behind the window is set to 0.
 void SampleAffine(const float* image, std::size_t image_width, std::size_t image_height,
+                  const affine_sampling& warp, const window_shape& shape, float* out);
+void SampleAffine(const std::uint8_t* image, std::size_t image_width, std::size_t image_height,
                   const affine_sampling& warp, const window_shape& shape, float* out);
 
 // sums = {S(gx gx), S(gx gy), S(gy gy)}.

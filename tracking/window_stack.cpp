@@ -50,10 +50,13 @@ void ExtractWindowLevel(std::size_t level, float x, float y, const ImagePyramid&
   y *= LevelScale(level);
   const float ix = std::floor(x);
   const float iy = std::floor(y);
-  kernels::SampleTranslated(pyramid.LevelData(level), pyramid.LevelWidth(level), shape.channels,
-                            static_cast<std::size_t>(ix) - shape.half_x - 1,
-                            static_cast<std::size_t>(iy) - shape.half_y - 1, x - ix, y - iy,
-                            shape.columns() + 2, shape.rows() + 2, scratch);
+  const level_image image = pyramid.Level(level);
+  image.WithSamples([&](const auto* samples) {
+    kernels::SampleTranslated(samples, image.width, shape.channels,
+                              static_cast<std::size_t>(ix) - shape.half_x - 1,
+                              static_cast<std::size_t>(iy) - shape.half_y - 1, x - ix, y - iy,
+                              shape.columns() + 2, shape.rows() + 2, scratch);
+  });
   const std::size_t plane = shape.plane_size();
   float* t = stack.data.data() + 3 * level * plane;
   kernels::SplitGradients(scratch, shape, t, t + plane, t + 2 * plane);

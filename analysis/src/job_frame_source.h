@@ -34,6 +34,9 @@ class JobFrameSource final : public marrow::tracking::FrameSource {
   void LoadLuma(std::size_t frame, float* destination) override;
   void LoadMask(std::size_t frame, std::uint8_t* destination) override;
   void LoadColor(std::size_t frame, float* destination) override;
+  marrow::tracking::ImagePyramid::first_level first_level() const override {
+    return marrow::tracking::ImagePyramid::first_level::bytes;
+  }
   void LoadColorPyramid(std::size_t frame, marrow::tracking::ImagePyramid& pyramid,
                         std::vector<float>& scratch) override;
 

@@ -42,19 +42,24 @@ TEST(FramePreparationTest, EqualsThePlainLoopsForAnyWidthAndStride) {
                               bottom_up ? -pitch : pitch, width, kHeight};
         const std::size_t size = width * kHeight;
         std::vector<float> luma(size + 1, -7), color(3 * size + 1, -7);
-        std::vector<std::uint8_t> mask(size + 1, 7);
+        std::vector<std::uint8_t> mask(size + 1, 7), color_bytes(3 * size + 1, 7);
         LumaFromArgb(frame, luma.data());
         MaskFromArgb(frame, mask.data());
         ColorFromArgb(frame, color.data());
+        ColorFromArgb(frame, color_bytes.data());
         for (std::size_t i = 0; i < size; ++i) {
           const std::size_t y = i / width;
           const auto* p = &bytes[(bottom_up ? kHeight - 1 - y : y) * pitch + 4 * (i % width)];
           ASSERT_EQ(luma[i], (9798 * p[1] + 19235 * p[2] + 3735 * p[3] + 16384) / 32768);
           ASSERT_EQ(mask[i], p[0] > 127 ? 1 : 0);
-          for (int c = 0; c < 3; ++c) ASSERT_EQ(color[3 * i + c], p[1 + c]);
+          for (int c = 0; c < 3; ++c) {
+            ASSERT_EQ(color[3 * i + c], p[1 + c]);
+            ASSERT_EQ(color_bytes[3 * i + c], p[1 + c]);
+          }
         }
         ASSERT_EQ(luma[size], -7);
         ASSERT_EQ(color[3 * size], -7);
+        ASSERT_EQ(color_bytes[3 * size], 7);
         ASSERT_EQ(mask[size], 7);
       }
     }

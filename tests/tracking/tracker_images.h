@@ -37,7 +37,7 @@ ImagePyramid Picture(std::size_t width, std::size_t height, std::size_t channels
 }
 
 inline level_image Level0(const ImagePyramid& pyramid) {
-  return {pyramid.LevelData(0), pyramid.width, pyramid.height};
+  return pyramid.Level(0);
 }
 
 // A template around a point of level 0, with all that the solvers want beside it.

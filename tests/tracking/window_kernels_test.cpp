@@ -87,6 +87,8 @@ struct PlainImage {
     }
     return sum;
   }
+  std::vector<std::uint8_t> Bytes() const { return {data.begin(), data.end()}; }
+
   std::size_t width, height, channels;
   std::vector<float> data;
 };
@@ -109,6 +111,10 @@ TEST(WindowKernelsTest, TranslatedSamplesReachTheImagesLastPixel) {
                         1e-4);
           }
           ASSERT_EQ(out.back(), -7.0f);
+          std::vector<float> of_bytes(out.size(), -7.0f);
+          kernels::SampleTranslated(image.Bytes().data(), image.width, shape.channels, x, y, 0.375f,
+                                    0.75f, shape.columns(), shape.rows(), of_bytes.data());
+          ASSERT_EQ(of_bytes, out);
         }
       }
     });
@@ -167,6 +173,10 @@ TEST(WindowKernelsTest, AffineSamplesInTheMiddleAndOnTheLastRow) {
                       5e-3);
         }
         ASSERT_EQ(out[shape.samples()], 0.0f);
+        std::vector<float> of_bytes(out.size(), -7.0f);
+        kernels::SampleAffine(image.Bytes().data(), image.width, image.height, warp, shape,
+                              of_bytes.data());
+        ASSERT_TRUE(std::equal(out.begin(), out.begin() + shape.samples() + 1, of_bytes.begin()));
       }
     });
   });
