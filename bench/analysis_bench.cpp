@@ -122,8 +122,8 @@ class MemorySource final : public FrameSource {
   std::size_t width() const override { return Input().width; }
   std::size_t height() const override { return Input().height; }
   std::size_t frame_count() const override { return kRun; }
-  void LoadLuma(std::size_t t, float* out) override { LumaFromArgb(Frame(t), out); }
-  void LoadMask(std::size_t t, std::uint8_t* out) override { MaskFromArgb(Frame(t), out); }
+  void LoadLuma(std::size_t t, float* out) override { images_.Luma(t, Frame(t), out); }
+  void LoadMask(std::size_t t, std::uint8_t* out) override { images_.Mask(t, Frame(t), out); }
   void LoadColor(std::size_t t, float* out) override { ColorFromArgb(Frame(t), out); }
   ImagePyramid::first_level first_level() const override {
     return ImagePyramid::first_level::bytes;
@@ -135,6 +135,8 @@ class MemorySource final : public FrameSource {
 
  private:
   static ArgbFrame Frame(std::size_t t) { return Input().Argb(FrameOfRun(t)); }
+
+  SelectorImages images_;
 };
 
 void SelectCandidates(std::size_t frame, FeatureSelector& selector) {
@@ -169,6 +171,7 @@ void Preparation(benchmark::State& state) {
   std::vector<float> luma(in.width * in.height), scratch;
   std::vector<std::uint8_t> mask(in.width * in.height);
   ImagePyramid pyramid(in.width, in.height, 3, kLevels, ImagePyramid::first_level::bytes);
+  SelectorImages images;
   cv::Mat rgb, colour, single;
   in.grey[0].convertTo(single, kPeerDepth);
   std::vector<cv::Mat> levels;
@@ -179,8 +182,8 @@ void Preparation(benchmark::State& state) {
       [&] {
         const ArgbFrame argb = in.Argb(frame());
         ColorPyramidFromArgb(argb, pyramid, scratch);
-        LumaFromArgb(argb, luma.data());
-        MaskFromArgb(argb, mask.data());
+        images.Luma(f, argb, luma.data());
+        images.Mask(f, argb, mask.data());
       },
       [&] {
         cv::cvtColor(in.Mat(frame()), rgb, cv::COLOR_RGBA2RGB);

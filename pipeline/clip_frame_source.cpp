@@ -25,11 +25,11 @@ marrow::tracking::ArgbFrame ClipFrameSource::Fetch(std::size_t picture) {
 }
 
 void ClipFrameSource::LoadLuma(std::size_t picture, float* destination) {
-  LumaFromArgb(Fetch(picture), destination);
+  images_.Luma(picture, Fetch(picture), destination);
 }
 
 void ClipFrameSource::LoadMask(std::size_t picture, std::uint8_t* destination) {
-  MaskFromArgb(Fetch(picture), destination);
+  images_.Mask(picture, Fetch(picture), destination);
 }
 
 void ClipFrameSource::LoadColor(std::size_t picture, float* destination) {

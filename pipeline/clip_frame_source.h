@@ -33,6 +33,7 @@ class ClipFrameSource final : public marrow::tracking::FrameSource {
 
   const media::ClipInfo& info_;
   PictureReader<HX_Pixel8> reader_;
+  marrow::tracking::SelectorImages images_;
   const boost::function<void(std::size_t)> poll_;
   std::size_t polled_ = static_cast<std::size_t>(-1);  // the last picture that poll_ heard of
 };

@@ -2,6 +2,7 @@
 
 #include <hwy/cache_control.h>
 
+#include <algorithm>
 #include <bit>
 #include <cstring>
 
@@ -49,9 +50,12 @@ HWY_INLINE auto LoadPixels(const std::uint8_t* row, std::size_t x) {
 #endif
 }
 
-void LumaRows(const ArgbFrame& frame, float* luma) {
+// True if every pixel's alpha is above 127.
+bool LumaRows(const ArgbFrame& frame, float* luma) {
   const Pixels d;
   const Floats df;
+  auto alphas = hn::Set(d, 255);
+  std::uint8_t last_alphas = 255;
   const std::size_t N = hn::Lanes(d);
   for (std::size_t y = 0; y < frame.height; ++y, luma += frame.width) {
     const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
@@ -59,6 +63,7 @@ void LumaRows(const ArgbFrame& frame, float* luma) {
     for (; x + N <= frame.width; x += N) {
       hwy::Prefetch(row + 4 * x + kBytesAhead);
       const auto pixels = LoadPixels(row, x);
+      alphas = hn::And(alphas, pixels);
       const auto red_green = hn::Add(hn::Mul(Red(pixels), hn::Set(d, 9798)),
                                      hn::Mul(Green(pixels), hn::Set(d, 19235)));
       const auto blue_half = hn::Add(hn::Mul(Blue(pixels), hn::Set(d, 3735)), hn::Set(d, 16384));
@@ -68,8 +73,11 @@ void LumaRows(const ArgbFrame& frame, float* luma) {
     for (; x < frame.width; ++x) {
       const std::uint8_t* p = row + 4 * x;
       luma[x] = static_cast<float>((9798 * p[1] + 19235 * p[2] + 3735 * p[3] + 16384) >> 15);
+      last_alphas &= p[0];
     }
   }
+  const auto high_bit = hn::Set(d, 128);
+  return hn::AllTrue(d, hn::Eq(hn::And(alphas, high_bit), high_bit)) && last_alphas > 127;
 }
 
 void MaskRows(const ArgbFrame& frame, std::uint8_t* mask) {
@@ -163,6 +171,20 @@ HWY_EXPORT(WidenBytes);
 
 void LumaFromArgb(const ArgbFrame& frame, float* luma) {
   HWY_DYNAMIC_DISPATCH(LumaRows)(frame, luma);
+}
+
+void SelectorImages::Luma(std::size_t frame_index, const ArgbFrame& frame, float* luma) {
+  opaque_ = HWY_DYNAMIC_DISPATCH(LumaRows)(frame, luma);
+  frame_index_ = frame_index;
+  top_row_ = frame.top_row;
+}
+
+void SelectorImages::Mask(std::size_t frame_index, const ArgbFrame& frame, std::uint8_t* mask) {
+  if (opaque_ && frame_index_ == frame_index && top_row_ == frame.top_row) {
+    std::fill_n(mask, frame.width * frame.height, std::uint8_t{1});
+  } else {
+    MaskFromArgb(frame, mask);
+  }
 }
 
 void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask) {

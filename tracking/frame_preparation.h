@@ -22,6 +22,20 @@ void LumaFromArgb(const ArgbFrame& frame, float* luma);
 // width * height bytes: 1 where alpha is above 127, else 0.
 void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask);
 
+// The luma of a source's frames and then, of the same pixels, the mask. Luma finds out whether a
+// frame is opaque, as most are, and the mask of one that is needs no second look at its pixels.
+class SelectorImages {
+ public:
+  void Luma(std::size_t frame_index, const ArgbFrame& frame, float* luma);
+  void Mask(std::size_t frame_index, const ArgbFrame& frame, std::uint8_t* mask);
+
+ private:
+  // Of the last luma.
+  bool opaque_ = false;
+  std::size_t frame_index_ = 0;
+  const std::uint8_t* top_row_ = nullptr;
+};
+
 // width * height * 3 floats or bytes: red, green, blue from 0 to 255, interleaved, whatever alpha
 // is.
 void ColorFromArgb(const ArgbFrame& frame, float* color);

@@ -89,11 +89,11 @@ void JobFrameSource::ReleaseFrames() {
 }
 
 void JobFrameSource::LoadLuma(std::size_t frame, float* destination) {
-  Load(luma_, frame, [&](const auto& argb) { LumaFromArgb(argb, destination); });
+  Load(luma_, frame, [&](const auto& argb) { images_.Luma(frame, argb, destination); });
 }
 
 void JobFrameSource::LoadMask(std::size_t frame, std::uint8_t* destination) {
-  Load(mask_, frame, [&](const auto& argb) { MaskFromArgb(argb, destination); });
+  Load(mask_, frame, [&](const auto& argb) { images_.Mask(frame, argb, destination); });
 }
 
 void JobFrameSource::LoadColor(std::size_t frame, float* destination) {

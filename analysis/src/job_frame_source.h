@@ -59,6 +59,7 @@ class JobFrameSource final : public marrow::tracking::FrameSource {
   Job& job_;
   const RunFrames run_;
   Reader mask_, luma_, color_;
+  marrow::tracking::SelectorImages images_;
 };
 
 }  // namespace kelp::analysis

@@ -81,5 +81,34 @@ TEST(FramePreparationTest, TransparentPixelsKeepTheirColour) {
   EXPECT_EQ(color[1], 200.0f);
 }
 
+TEST(SelectorImagesTest, MasksAreThoseOfTheirOwnPixels) {
+  for (const std::size_t width : {1, 16, 37}) {
+    const std::size_t size = 2 * width;
+    std::vector<std::uint8_t> pixels(4 * size, 200), found(size), expected(size);
+    std::vector<float> luma(size);
+    SelectorImages images;
+    const ArgbFrame frame{pixels.data(), static_cast<std::ptrdiff_t>(4 * width), width, 2};
+    const auto expect_mask = [&](std::size_t index, const ArgbFrame& of) {
+      images.Mask(index, of, found.data());
+      MaskFromArgb(of, expected.data());
+      ASSERT_EQ(found, expected);
+    };
+    images.Luma(0, frame, luma.data());
+    expect_mask(0, frame);
+    for (std::size_t hole = 0; hole < size; ++hole) {
+      pixels[4 * hole] = 127;
+      images.Luma(hole, frame, luma.data());
+      expect_mask(hole, frame);
+      pixels[4 * hole] = 128;
+    }
+    // Other pixels than the luma's: a later frame in the same place, and another place.
+    images.Luma(7, frame, luma.data());
+    pixels[0] = 0;
+    expect_mask(8, frame);
+    std::vector<std::uint8_t> others(4 * size, 0);
+    expect_mask(7, {others.data(), frame.row_bytes, width, 2});
+  }
+}
+
 }  // namespace
 }  // namespace marrow::tracking
