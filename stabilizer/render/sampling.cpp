@@ -1,5 +1,6 @@
 #include "stabilizer/render/sampling.h"
 
+#include <algorithm>
 #include <cmath>
 #include <cstdint>
 #include <cstring>
@@ -113,6 +114,58 @@ HWY_INLINE void Words(const unsigned char* p, VOffset lower, VOffset upper, VU& 
   const auto second = hn::BitCast(DU(), hn::GatherOffset(D64(), base, upper));
   low = hn::ConcatEven(DU(), second, first);
   high = hn::ConcatOdd(DU(), second, first);
+}
+
+// Lane j is lane place[j] of the vectors `first` and `second`, one behind the other.
+HWY_INLINE VU LookUp(VU first, VU second, VU place) {
+#if HWY_ARCH_X86 && HWY_TARGET <= HWY_AVX3  // one instruction, which the library doesn't offer
+  return VU{_mm512_permutex2var_epi32(first.raw, place.raw, second.raw)};
+#else
+  const DU d;
+  const auto last = hn::Set(d, static_cast<std::uint32_t>(hn::Lanes(d) - 1));
+  const auto lane = hn::IndicesFromVec(d, hn::And(place, last));
+  return hn::IfThenElse(hn::Gt(place, last), hn::TableLookupLanes(second, lane),
+                        hn::TableLookupLanes(first, lane));
+#endif
+}
+
+// Corners a b above c d of pixels of 32 bits, or false: where the source positions lie close
+// together in a row or two, as they do in a warp near the identity, whole loads and lookups take
+// the place of gathers.
+HWY_INLINE bool Corners(const source_plane& source, const std::int32_t* ix, const std::int32_t* iy,
+                        VU& a, VU& b, VU& c, VU& e) {
+  const DI di;
+  const DU du;
+  const int lanes = static_cast<int>(hn::Lanes(di));
+  const std::int32_t left = ix[0];
+  const std::int32_t top = std::min(iy[0], iy[lanes - 1]);
+  if (left > source.width - 2 * lanes) return false;
+  const auto place = hn::BitCast(du, hn::Sub(hn::Load(di, ix), hn::Set(di, left)));
+  const auto row = hn::BitCast(du, hn::Sub(hn::Load(di, iy), hn::Set(di, top)));
+  const auto near = hn::And(hn::Lt(place, hn::Set(du, static_cast<std::uint32_t>(2 * lanes - 1))),
+                            hn::Lt(row, hn::Set(du, 2)));
+  if (!hn::AllTrue(du, near)) return false;
+  const auto right_place = hn::Add(place, hn::Set(du, 1));
+  const hn::Repartition<std::uint8_t, DU> bytes;
+  const unsigned char* p = source.data + top * source.row_bytes + 4 * std::ptrdiff_t{left};
+  const auto of_row = [&](int r, VU& at_left, VU& at_right) HWY_ATTR {
+    const unsigned char* pixels = p + r * source.row_bytes;
+    const auto first = hn::BitCast(du, hn::LoadU(bytes, pixels));
+    const auto second = hn::BitCast(du, hn::LoadU(bytes, pixels + 4 * lanes));
+    at_left = LookUp(first, second, place);
+    at_right = LookUp(first, second, right_place);
+  };
+  of_row(0, a, b);
+  of_row(1, c, e);
+  const auto lower = hn::Eq(row, hn::Set(du, 1));
+  if (hn::AllFalse(du, lower)) return true;
+  VU below_left, below_right;
+  of_row(2, below_left, below_right);
+  a = hn::IfThenElse(lower, c, a);
+  b = hn::IfThenElse(lower, e, b);
+  c = hn::IfThenElse(lower, below_left, c);
+  e = hn::IfThenElse(lower, below_right, e);
+  return true;
 }
 
 HWY_INLINE VF Rounded(VF v) {  // v >= 0
@@ -257,26 +310,34 @@ HWY_INLINE void Sample(const source_plane& source, Stretch& s) {
   const auto row_bytes = hn::Set(di, static_cast<std::int32_t>(source.row_bytes));
   const auto pixel_bytes = hn::Set(di, static_cast<std::int32_t>(sizeof(Pixel)));
   const unsigned char* below = source.data + source.row_bytes;
-  // The last vector reads the top left in the lanes that are left over.
-  for (std::int32_t* whole : {s.ix, s.iy}) hn::StoreU(hn::Zero(di), di, whole + s.count);
+  // The lanes of the last vector that are left over repeat the last pixel.
+  for (std::int32_t* whole : {s.ix, s.iy}) {
+    hn::StoreU(hn::Set(di, whole[s.count - 1]), di, whole + s.count);
+  }
   for (float* part : {s.fx, s.fy}) hn::StoreU(hn::Zero(d), d, part + s.count);
 
   for (int k = 0; k < s.count; k += lanes) {
-    const auto ix = hn::Load(di, s.ix + k), iy = hn::Load(di, s.iy + k);
-    const auto offset = [&](auto x, auto y) HWY_ATTR {
-      const auto bytes = [&](auto v, auto unit) HWY_ATTR {
-        return hn::MulEven(hn::BitCast(di, hn::PromoteTo(dofs, v)), unit);
-      };
-      return hn::Add(bytes(y, row_bytes), bytes(x, pixel_bytes));
-    };
-    const auto lower = offset(hn::LowerHalf(half, ix), hn::LowerHalf(half, iy));
-    const auto upper = offset(hn::UpperHalf(half, ix), hn::UpperHalf(half, iy));
     // Corners a b above c d.
     VU a0, a1, a2, a3, b0, b1, b2, b3, c0, c1, c2, c3, d0, d1, d2, d3;
     a0 = a1 = a2 = a3 = b0 = b1 = b2 = b3 = hn::Zero(DU());
     c0 = c1 = c2 = c3 = d0 = d1 = d2 = d3 = hn::Zero(DU());
-    Depth::Load(source.data, lower, upper, a0, a1, a2, a3, b0, b1, b2, b3);
-    Depth::Load(below, lower, upper, c0, c1, c2, c3, d0, d1, d2, d3);
+    bool loaded = false;
+    if constexpr (sizeof(Pixel) == 4) {
+      loaded = Corners(source, s.ix + k, s.iy + k, a0, b0, c0, d0);
+    }
+    if (!loaded) {
+      const auto ix = hn::Load(di, s.ix + k), iy = hn::Load(di, s.iy + k);
+      const auto offset = [&](auto x, auto y) HWY_ATTR {
+        const auto bytes = [&](auto v, auto unit) HWY_ATTR {
+          return hn::MulEven(hn::BitCast(di, hn::PromoteTo(dofs, v)), unit);
+        };
+        return hn::Add(bytes(y, row_bytes), bytes(x, pixel_bytes));
+      };
+      const auto lower = offset(hn::LowerHalf(half, ix), hn::LowerHalf(half, iy));
+      const auto upper = offset(hn::UpperHalf(half, ix), hn::UpperHalf(half, iy));
+      Depth::Load(source.data, lower, upper, a0, a1, a2, a3, b0, b1, b2, b3);
+      Depth::Load(below, lower, upper, c0, c1, c2, c3, d0, d1, d2, d3);
+    }
     const auto tx = hn::Load(d, s.fx + k), ty = hn::Load(d, s.fy + k);
     const auto sx = hn::Sub(hn::Set(d, 1.0f), tx), sy = hn::Sub(hn::Set(d, 1.0f), ty);
 
