@@ -168,8 +168,19 @@ HWY_INLINE bool Corners(const source_plane& source, const std::int32_t* ix, cons
   return true;
 }
 
-HWY_INLINE VF Rounded(VF v) {  // v >= 0
-  return hn::Floor(hn::Add(v, hn::Set(DF(), 0.5f)));
+// The whole part of 0 <= v < 2^31.
+HWY_INLINE hn::Vec<DI> Whole(VF v) {
+#if HWY_ARCH_X86 && HWY_TARGET <= HWY_AVX3  // the library's also looks for what is out of range
+  return hn::Vec<DI>{_mm512_cvttps_epi32(v.raw)};
+#elif HWY_TARGET == HWY_AVX2
+  return hn::Vec<DI>{_mm256_cvttps_epi32(v.raw)};
+#else
+  return hn::ConvertTo(DI(), v);
+#endif
+}
+
+HWY_INLINE VF Rounded(VF v) {  // 0 <= v < 2^31
+  return hn::ConvertTo(DF(), Whole(hn::Add(v, hn::Set(DF(), 0.5f))));
 }
 
 HWY_INLINE VU Bits(VF whole) {
@@ -197,6 +208,35 @@ struct Depth8 {
   static HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU d) {
     const auto differ = hn::Or(hn::Xor(a, b), hn::Or(hn::Xor(a, c), hn::Xor(a, d)));
     return hn::AllTrue(DU(), hn::Eq(hn::And(differ, hn::Set(DU(), 255)), hn::Zero(DU())));
+  }
+  // The samples of pixels with one alpha for all four corners. Red and green are not
+  // shifted down: as 2^8 and 2^16 of themselves, with weights as much smaller, they make the very
+  // same products.
+  static HWY_INLINE void StoreOneAlpha(VU a, VU b, VU c, VU e, VF sx, VF tx, VF sy, VF ty,
+                                       unsigned char* out) {
+    const DF d;
+    const auto between = [&](VF p, VF q, VF s, VF t) HWY_ATTR {
+      const auto v = hn::Add(hn::Mul(p, s), hn::Mul(q, t));
+      return Whole(hn::Add(v, hn::Set(d, 0.5f)));
+    };
+    const auto sample = [&](const auto& channel, VF s, VF t) HWY_ATTR {
+      const auto left = hn::ConvertTo(d, between(channel(a), channel(c), s, t));
+      const auto right = hn::ConvertTo(d, between(channel(b), channel(e), s, t));
+      return hn::BitCast(DU(), between(left, right, sx, tx));
+    };
+    const auto down8 = hn::Set(d, 1.0f / 256), down16 = hn::Set(d, 1.0f / 65536);
+    const auto red = sample([](VU v) HWY_ATTR { return Lanes(hn::And(v, hn::Set(DU(), 0xFF00))); },
+                            hn::Mul(sy, down8), hn::Mul(ty, down8));
+    const auto green =
+        sample([](VU v) HWY_ATTR { return Lanes(hn::And(v, hn::Set(DU(), 0xFF0000))); },
+               hn::Mul(sy, down16), hn::Mul(ty, down16));
+    const auto blue = sample([](VU v) HWY_ATTR { return Lanes(hn::ShiftRight<24>(v)); }, sy, ty);
+    const auto alpha = hn::And(a, hn::Set(DU(), 255));
+    const auto packed = hn::Or(hn::Or(alpha, hn::ShiftLeft<8>(red)),
+                               hn::Or(hn::ShiftLeft<16>(green), hn::ShiftLeft<24>(blue)));
+    const auto shown = hn::IfThenZeroElse(hn::Eq(alpha, hn::Zero(DU())), packed);
+    const hn::Repartition<std::uint8_t, DF> bytes;
+    hn::StoreU(hn::BitCast(bytes, shown), bytes, out);
   }
   static HWY_INLINE void Store(VF alpha, VF red, VF green, VF blue, unsigned char* out) {
     // What lies above a channel's bits is shifted out or covered.
@@ -341,7 +381,10 @@ HWY_INLINE void Sample(const source_plane& source, Stretch& s) {
     const auto tx = hn::Load(d, s.fx + k), ty = hn::Load(d, s.fy + k);
     const auto sx = hn::Sub(hn::Set(d, 1.0f), tx), sy = hn::Sub(hn::Set(d, 1.0f), ty);
 
-    VF alpha, red, green, blue;
+    unsigned char* out = s.out + static_cast<std::ptrdiff_t>(sizeof(Pixel)) * k;
+    HWY_ALIGN unsigned char rest[max_lanes * sizeof(Pixel)];
+    unsigned char* to = k + lanes <= s.count ? out : rest;
+    VF red, green, blue;
     const auto of_channels = [&](const auto& sample) HWY_ATTR {
       const auto channel = [&](auto i) HWY_ATTR {
         return sample(
@@ -352,19 +395,7 @@ HWY_INLINE void Sample(const source_plane& source, Stretch& s) {
       green = channel(std::integral_constant<int, 2>());
       blue = channel(std::integral_constant<int, 3>());
     };
-    if (Depth::OneAlpha(a0, b0, c0, d0)) {
-      const auto sample = [&](VF a, VF b, VF c, VF e) HWY_ATTR {
-        return Between<Depth>(Between<Depth>(a, c, sy, ty), Between<Depth>(b, e, sy, ty), sx, tx);
-      };
-      of_channels(sample);
-      alpha = Depth::template Channel<0>(a0, a1, a2, a3);
-      const auto nothing = hn::Eq(alpha, hn::Zero(d));
-      if constexpr (!Depth::rounds) alpha = sample(alpha, alpha, alpha, alpha);
-      alpha = hn::IfThenZeroElse(nothing, alpha);
-      red = hn::IfThenZeroElse(nothing, red);
-      green = hn::IfThenZeroElse(nothing, green);
-      blue = hn::IfThenZeroElse(nothing, blue);
-    } else {
+    if (!Depth::OneAlpha(a0, b0, c0, d0)) {
       const Weights<Depth> left(Depth::template Channel<0>(a0, a1, a2, a3),
                                 Depth::template Channel<0>(c0, c1, c2, c3), sy, ty);
       const Weights<Depth> right(Depth::template Channel<0>(b0, b1, b2, b3),
@@ -372,14 +403,21 @@ HWY_INLINE void Sample(const source_plane& source, Stretch& s) {
       const Weights<Depth> both(left.Alpha(), right.Alpha(), sx, tx);
       of_channels([&](VF a, VF b, VF c, VF e)
                       HWY_ATTR { return both.Colour(left.Colour(a, c), right.Colour(b, e)); });
-      alpha = both.Alpha();
-    }
-    unsigned char* out = s.out + static_cast<std::ptrdiff_t>(sizeof(Pixel)) * k;
-    if (k + lanes <= s.count) {
-      Depth::Store(alpha, red, green, blue, out);
+      Depth::Store(both.Alpha(), red, green, blue, to);
+    } else if constexpr (std::is_same_v<Depth, Depth8>) {
+      Depth::StoreOneAlpha(a0, b0, c0, d0, sx, tx, sy, ty, to);
     } else {
-      HWY_ALIGN unsigned char rest[max_lanes * sizeof(Pixel)];
-      Depth::Store(alpha, red, green, blue, rest);
+      const auto sample = [&](VF a, VF b, VF c, VF e) HWY_ATTR {
+        return Between<Depth>(Between<Depth>(a, c, sy, ty), Between<Depth>(b, e, sy, ty), sx, tx);
+      };
+      of_channels(sample);
+      auto alpha = Depth::template Channel<0>(a0, a1, a2, a3);
+      const auto nothing = hn::Eq(alpha, hn::Zero(d));
+      if constexpr (!Depth::rounds) alpha = sample(alpha, alpha, alpha, alpha);
+      const auto shown = [&](VF v) HWY_ATTR { return hn::IfThenZeroElse(nothing, v); };
+      Depth::Store(shown(alpha), shown(red), shown(green), shown(blue), to);
+    }
+    if (to == rest) {
       std::memcpy(out, rest, sizeof(Pixel) * static_cast<std::size_t>(s.count - k));
     }
   }
