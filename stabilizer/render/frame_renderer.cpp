@@ -147,7 +147,7 @@ bool renderFrame(const ClipWarps& warps, const cropper* crop, const RenderSettin
                               frame,
                               scaled_crop(crop, crops(settings.framing), frame, renderer),
                               zoom};
-  // Each band is cleared right before it is drawn, while it goes to the cache anyway.
+  // A band clears what its cells leave.
   drawFrame(pass, frame, output, true);
   deblurFrame(pass, output);
   if (synthesizes) synthesizeEdges(pass, output);

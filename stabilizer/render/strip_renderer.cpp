@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <cmath>
+#include <cstring>
 #include <limits>
 
 using marrow::stabilization::matrix3;
@@ -85,11 +86,27 @@ struct StripRenderer<Pixel>::cell {
   bool border;
 };
 
-// Runs of a row that are not drawn yet.
+// A band's runs that are not drawn yet, and which pixels have been given some.
 template <class Pixel>
-struct StripRenderer<Pixel>::row_runs {
+struct StripRenderer<Pixel>::band_runs {
+  struct span {
+    int y;
+    int x0;
+    int x1;
+  };
+
+  // Joins what follows right on.
+  void Add(int y, int x0, int x1) {
+    if (!spans.empty() && spans.back().y == y && spans.back().x1 == x0) {
+      spans.back().x1 = x1;
+    } else {
+      spans.push_back({y, x0, x1});
+    }
+  }
+
   std::array<source_run<Pixel>, 128> runs;
   std::size_t count = 0;
+  std::vector<span> spans;
 };
 
 namespace {
@@ -152,16 +169,39 @@ template <class Pixel>
 void StripRenderer<Pixel>::operator()(std::size_t band) const {
   const std::int64_t first = static_cast<std::int64_t>(band) * band_height_;
   const std::int64_t end = std::min<std::int64_t>(first + band_height_, destination_.height());
-  if (clears_) destination_.clear(static_cast<int>(first), static_cast<int>(end));
+  band_runs runs;
   // A zoom of 0 shows nothing.
-  if (!(zoom_ > 0) || source_.width < 1 || source_.height < 1) return;
-  if (only_ && !only_->touches(0, first, destination_.width(), end)) return;
-  for (std::int32_t r = 0; r + 1 < renderer_.rows; ++r) drawGridRow(r, first, end);
+  if (zoom_ > 0 && source_.width >= 1 && source_.height >= 1 &&
+      (!only_ || only_->touches(0, first, destination_.width(), end))) {
+    for (std::int32_t r = 0; r + 1 < renderer_.rows; ++r) drawGridRow(r, first, end, runs);
+  }
+  if (clears_) clearRest(static_cast<int>(first), static_cast<int>(end), runs);
 }
 
 template <class Pixel>
-void StripRenderer<Pixel>::drawGridRow(std::int32_t r, std::int64_t first_row,
-                                       std::int64_t end_row) const {
+void StripRenderer<Pixel>::clearRest(int first, int end, band_runs& runs) const {
+  std::sort(runs.spans.begin(), runs.spans.end(),
+            [](const auto& a, const auto& b) { return a.y != b.y ? a.y < b.y : a.x0 < b.x0; });
+  auto next = runs.spans.begin();
+  for (int y = first; y < end; ++y) {
+    int x = 0;
+    const auto clear_to = [&](int x1) {
+      if (x1 > x) {
+        std::memset(static_cast<void*>(destination_.row(y) + x), 0,
+                    sizeof(Pixel) * static_cast<std::size_t>(x1 - x));
+      }
+    };
+    for (; next != runs.spans.end() && next->y == y; ++next) {
+      clear_to(next->x0);
+      x = std::max(x, next->x1);
+    }
+    clear_to(destination_.width());
+  }
+}
+
+template <class Pixel>
+void StripRenderer<Pixel>::drawGridRow(std::int32_t r, std::int64_t first_row, std::int64_t end_row,
+                                       band_runs& runs) const {
   const row_extent& a = extents_[static_cast<std::size_t>(r)];
   const row_extent& b = extents_[static_cast<std::size_t>(r) + 1];
   const auto to_destination = static_cast<double>(to_destination_y_);
@@ -185,7 +225,6 @@ void StripRenderer<Pixel>::drawGridRow(std::int32_t r, std::int64_t first_row,
     y0 = std::min(y0, q.y0);
     y1 = std::max(y1, q.y1);
   }
-  row_runs runs;
   for (std::int64_t y = y0; y < y1; ++y) {
     for (const cell& q : cells) {
       if (y >= q.y0 && y < q.y1) drawRow(q, y, runs);
@@ -249,12 +288,11 @@ bool StripRenderer<Pixel>::setUpCell(std::int32_t c, std::int32_t r, std::int64_
 }
 
 template <class Pixel>
-void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, row_runs& runs) const {
+void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, band_runs& runs) const {
   const double py = (static_cast<double>(y) + offset_y_) / zoom_;
   if (!(py < renderer_.planeHeight)) return;
   const double test_y = static_cast<double>(y) / zoom_;
   const double* test_x = test_x_.data() + to_destination_x_;
-  Pixel* row = destination_.row(static_cast<int>(y + to_destination_y_));
 
   std::int64_t inside0 = q.x0;
   std::int64_t inside1 = q.x1;
@@ -263,7 +301,7 @@ void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, row_runs& runs
   q.edges[2].cutSeldom(zoom_, test_x, test_y, inside0, inside1);
   q.edges[3].cut(zoom_, test_x, test_y, inside0, inside1);
   if (!q.border) {
-    drawSpan(q, inside0, inside1, py, row, runs);
+    drawSpan(q, inside0, inside1, y, py, runs);
     return;
   }
   // A border cell also takes what lies near an outer edge that it owns.
@@ -278,17 +316,22 @@ void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, row_runs& runs
   for (std::int64_t x = q.x0; x < q.x1; ++x) {
     if (x == inside0) x = inside1;
     if (x < q.x1 && near(x)) continue;
-    drawSpan(q, begin, std::min(x, q.x1), py, row, runs);
+    drawSpan(q, begin, std::min(x, q.x1), y, py, runs);
     begin = x + 1;
   }
-  drawSpan(q, begin, q.x1, py, row, runs);
+  drawSpan(q, begin, q.x1, y, py, runs);
 }
 
 template <class Pixel>
-void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py,
-                                    Pixel* row, row_runs& runs) const {
+void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, std::int64_t y,
+                                    double py, band_runs& runs) const {
   const double* plane_x = plane_x_.data() + to_destination_x_;
   while (x0 < x1 && !(plane_x[x1 - 1] < renderer_.planeWidth)) --x1;
+  if (x0 >= x1) return;
+  const int row_of_span = static_cast<int>(y + to_destination_y_);
+  Pixel* row = destination_.row(row_of_span);
+  runs.Add(row_of_span, static_cast<int>(x0 + to_destination_x_),
+           static_cast<int>(x1 + to_destination_x_));
   const matrix3& h = q.square_from_plane;
   for (std::int64_t x = x0; x < x1; x += max_run) {
     const double px = plane_x[x];

@@ -18,8 +18,8 @@ template <class Pixel>
 class StripRenderer : FrameMesh {
  public:
   // mesh: for a destination of that size. With `only`, tiles of the destination, their pixels are
-  // drawn as ever, and of the others some or none. With `clears`, a band is made transparent black
-  // first. All referents must outlive this.
+  // drawn as ever, and of the others some or none. With `clears`, what of a band no cell covers is
+  // made transparent black. All referents must outlive this.
   StripRenderer(const FrameMesh& mesh, const WorldX<Pixel>& source, WorldX<Pixel>& destination,
                 const TileMap* only = nullptr, bool clears = false);
 
@@ -29,14 +29,16 @@ class StripRenderer : FrameMesh {
 
  private:
   struct cell;
-  struct row_runs;
+  struct band_runs;
 
-  void drawGridRow(std::int32_t r, std::int64_t first_row, std::int64_t end_row) const;
+  void drawGridRow(std::int32_t r, std::int64_t first_row, std::int64_t end_row,
+                   band_runs& runs) const;
+  void clearRest(int first, int end, band_runs& runs) const;
   bool setUpCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row,
                  cell& q) const;
-  void drawRow(const cell& q, std::int64_t y, row_runs& runs) const;
-  void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, double py, Pixel* row,
-                row_runs& runs) const;
+  void drawRow(const cell& q, std::int64_t y, band_runs& runs) const;
+  void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, std::int64_t y, double py,
+                band_runs& runs) const;
 
   WorldX<Pixel>& destination_;
   const TileMap* only_;
