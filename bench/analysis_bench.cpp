@@ -1,8 +1,10 @@
 #include <benchmark/benchmark.h>
+#include <malloc.h>
 
 #include <algorithm>
 #include <cmath>
 #include <cstdlib>
+#include <limits>
 #include <memory>
 #include <opencv2/imgproc.hpp>
 #include <opencv2/video/tracking.hpp>
@@ -79,6 +81,10 @@ Frames ClipFrames(const char* path) {
 const Frames& Input() {
   static const Frames frames = [] {
     cv::setNumThreads(1);
+    // What either has freed stays at hand. By default it depends on the sizes that others have
+    // freed before whether OpenCV's images come fresh, page by page, from the system each time.
+    mallopt(M_MMAP_THRESHOLD, 1 << 30);
+    mallopt(M_TRIM_THRESHOLD, std::numeric_limits<int>::max());
     const char* path = std::getenv("CALMFRAME_BENCH_CLIP");
     Frames made = path ? ClipFrames(path) : StreetFrames();
     std::vector<float> luma(made.width * made.height);
