@@ -292,6 +292,42 @@ TEST(VerificationTest, OtherCellsArePassedOver) {
   EXPECT_THAT(off.statistics.verification, ::testing::Each(0u));
 }
 
+// Slots of every fate: moved, lost, rejected, empty.
+TEST(VerificationTest, OneWalkOverTheSlotsEndsAsTwoDo) {
+  const ImagePyramid first = Frame(Texture);
+  const ImagePyramid second = Picture(kWidth, kHeight, 3, 4, [](double x, double y, double c) {
+    return x < 80 ? Texture(x - 0.8, y + 0.6, c) : OtherTexture(x, y, c);
+  });
+  constexpr std::size_t kSlots = 40;
+  for (const bool verified : {true, false}) {
+    TrackerParams params = With([](auto&) {});
+    params.affine_verification = verified;
+    Follower two(params, kSlots), one(params, kSlots);
+    for (Follower* run : {&two, &one}) {
+      for (std::size_t s = 0; s < kSlots; ++s) {
+        run->from[s] = {4.0f + 4 * s, 64, s % 7 == 0 ? -1 : 1, 0};
+      }
+      run->tracker.InitialiseSeeds(first, run->from.data());
+    }
+    two.tracker.TrackFeatures(first, second, two.from.data(), two.to.data(), kSlots,
+                              two.statistics);
+    two.tracker.VerifyFeatures(second, two.to.data(), two.statistics);
+    one.tracker.TrackAndVerify(first, second, one.from.data(), one.to.data(), kSlots,
+                               one.statistics);
+    for (std::size_t s = 0; s < kSlots; ++s) {
+      EXPECT_EQ(one.to[s].status, two.to[s].status) << s;
+      EXPECT_EQ(one.to[s].x, two.to[s].x);
+      EXPECT_EQ(one.to[s].y, two.to[s].y);
+      EXPECT_EQ(one.to[s].correlation, two.to[s].correlation);
+    }
+    EXPECT_EQ(one.statistics.translation, two.statistics.translation);
+    EXPECT_EQ(one.statistics.verification, two.statistics.verification);
+    EXPECT_GT(two.statistics.translation[0], 0u);
+    EXPECT_GT(two.statistics.translation[1], 0u);
+    EXPECT_EQ(two.statistics.verification[1] > 0, verified);
+  }
+}
+
 TEST(VerificationTest, ColourModesThatVerifyNothing) {
   const ImagePyramid still = Frame(Texture);
   for (const int mode : {1, 3, 7}) {
