@@ -143,6 +143,9 @@ bool StabilizerEffect::StartSolveIfNeeded(StabilizerState& state) {
 }
 
 void StabilizerEffect::FinishSolve(StabilizerState& state) {
+  if (state.solver->GetState() == Solver::failed && state.solver->OutOfMemory()) {
+    ReportOutOfMemory();
+  }
   state.TakeSolve();
   const FrameStatus status =
       state.phase == SolvePhase::Solved ? FrameStatus::Ready : FrameStatus::SolveFailed;

@@ -94,6 +94,16 @@ TEST_F(TourFaults, AStatusThatCouldNotBeToldIsToldWithTheNextTick) {
   EXPECT_EQ(Session::StatusOf(effect), 4);
   Session::PauseBackgroundWork(false);
   EXPECT_EQ(Settle(effect), 8);
+  // One that was told of and can't begin is over.
+  EXPECT_TRUE(effect.SetParam(kDetailedAnalysis, 1).ok());
+  EXPECT_EQ(Session::StatusOf(effect), 4);
+  Operations::Get().FailAlways("Video Segment.GetSegmentNodeAt");
+  EXPECT_FALSE(effect.Tick().ok());
+  EXPECT_EQ(Session::WorkOf(effect), Session::Work::none);
+  Operations::Get().FailNone();
+  EXPECT_TRUE(effect.Tick().ok());
+  EXPECT_TRUE(effect.Press(kAnalyze).ok());
+  EXPECT_EQ(Settle(effect), 8);
 }
 
 // The operations of a tour by name: the first, the second and the last, which other threads' make
