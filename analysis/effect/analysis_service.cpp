@@ -192,7 +192,15 @@ void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
   boost::shared_ptr<Analyzer> analyzer;
   analyzer.swap(state.analyzer);
   // One that can't start is gone, so that it is not tried again with each tick.
-  analyzer->Start(context().in, context().out);
+  try {
+    analyzer->Start(context().in, context().out);
+  } catch (...) {
+    try {  // a host that was told of the analysis would wait for it
+      PublishStatus(FrameStatus::PressAnalyze);
+    } catch (...) {  // the first failure is the one that counts
+    }
+    throw;
+  }
   AnalysisState* present = nullptr;
   try {
     present = GetState();

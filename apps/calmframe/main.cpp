@@ -1,11 +1,14 @@
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <cstdio>
+#include <cstdlib>
+#include <cstring>
 #include <exception>
 #include <functional>
 #include <new>
 #include <nlohmann/json.hpp>
 #include <string>
+#include <system_error>
 #include <utility>
 #include <vector>
 
@@ -189,15 +192,36 @@ int Run(int argc, char** argv) {
   } catch (const SolveFailure& failure) {
     return Fail(kSolveFailed, failure.what(), json);
   } catch (const std::bad_alloc&) {
-    return Fail(kSolveFailed, "out of memory", json);
+    throw;
+  } catch (const std::system_error& error) {
+    const bool none = error.code() == std::errc::resource_unavailable_try_again;
+    return Fail(kSolveFailed, none ? "no thread can be started: too little memory" : error.what(),
+                json);
   } catch (const std::exception& error) {
     return Fail(kSolveFailed, error.what(), json);
   }
+}
+
+// Without memory of its own.
+int FailForMemory(int argc, char** argv) {
+  const bool json =
+      std::any_of(argv, argv + argc, [](const char* word) { return !std::strcmp(word, "--json"); });
+  std::fputs(
+      json ? "{\"error\":\"out of memory\",\"exit_code\":5}\n" : "calmframe: out of memory\n",
+      stderr);
+  return kSolveFailed;
 }
 
 }  // namespace
 }  // namespace calmframe
 
 int main(int argc, char** argv) {
-  return calmframe::Run(argc, argv);
+  // The plug-in has it use the calling thread only, but what it starts as it is loaded takes 128
+  // MiB of address space a processor, and goes round for ever where they are not to be had.
+  setenv("OPENBLAS_NUM_THREADS", "1", 0);
+  try {
+    return calmframe::Run(argc, argv);
+  } catch (const std::bad_alloc&) {
+    return calmframe::FailForMemory(argc, argv);
+  }
 }

@@ -13,8 +13,9 @@ void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
   const std::unique_ptr<CropWindow> crop = clip.Crop();
   if (!crop) return;
   if (crop->width <= 0 || crop->height <= 0) {
-    throw SolveFailure(
-        "no part of the picture stays in view; set --framing stabilize-only or adjust other flags");
+    throw SolveFailure(clip.path() +
+                       ": no part of the picture stays in view; set --framing stabilize-only or "
+                       "adjust other flags");
   }
   constexpr double kSmall = 0.4;  // of a side
   const media::ClipInfo& info = clip.info();

@@ -169,7 +169,7 @@ void SteadyClip::CheckResult(ProgressLine& progress) {
   CheckMedia();
   const std::vector<std::string> messages = effect_->TakeMessages();
   const int status = host::Session::StatusOf(*effect_);
-  if (status != kReady) throw SolveFailure(FailureText(status, messages));
+  if (status != kReady) throw SolveFailure(path() + ": " + FailureText(status, messages));
   for (const std::string& message : messages) progress.Warn(message);
 }
 

@@ -78,6 +78,10 @@ std::shared_ptr<WorldBuffer> RenderedFrame::OnLayer() const {
 
 Renderer::Renderer(Host& host, std::shared_ptr<TimelineEffect> effect)
     : host_(host), instance_(Instance::Make(host, std::move(effect))) {
+  MakeInstance();
+}
+
+void Renderer::MakeInstance() {
   result_ = instance_->Call(HX_CMD_RESTORE_INSTANCE, {});
 }
 
@@ -93,8 +97,10 @@ RenderedFrame Renderer::Render(const RenderRequest& request, bool planned, const
     rendered.result.code = kBadRequest;
     return rendered;
   }
+  if (!instance_->handle()) MakeInstance();
   try {
     draw(rendered);
+    if (!rendered.result.ok() && !result_.ok()) rendered.result = result_;
   } catch (const std::bad_alloc&) {
     rendered.pixels.reset();
     rendered.result = {HX_ERR_MEMORY, {}};

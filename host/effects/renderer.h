@@ -35,8 +35,9 @@ struct RenderedFrame {
 // effect work at once.
 class Renderer {
  public:
-  // See Effect::MakeRenderer. result() tells whether the plug-in made the instance; without it
-  // frames still come, as the plug-in can. A frame that there is no memory for has HX_ERR_MEMORY.
+  // See Effect::MakeRenderer. result() tells whether the plug-in made the instance; where it could
+  // not, each frame tries again, and still comes, as the plug-in can, or fails for that reason. A
+  // frame that there is no memory for has HX_ERR_MEMORY.
   Renderer(Host& host, std::shared_ptr<TimelineEffect> effect);
   ~Renderer();
   Renderer(const Renderer&) = delete;
@@ -51,6 +52,7 @@ class Renderer {
   RenderedFrame Planned(const RenderRequest& request);
 
  private:
+  void MakeInstance();
   void DrawDirect(const RenderRequest& request, RenderedFrame& rendered);
   void DrawPlanned(const RenderRequest& request, RenderedFrame& rendered);
   template <class Draw>

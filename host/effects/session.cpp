@@ -16,6 +16,25 @@ constexpr auto kTickPeriod = 50ms;
 // Even when effects ask for more: an analysis asks several times a frame.
 constexpr auto kShortestPeriod = 10ms;
 constexpr int kTicksBeforeALook = 3;
+// In a row, after which an effect is taken to make no headway: in want of memory, say.
+constexpr int kFailedTicks = 100;
+
+// Whether a tick of an effect that has work left went well.
+bool TickAll(std::mutex& mutex, std::vector<std::function<void()>>& posted,
+             const std::vector<std::unique_ptr<Effect>>& effects) {
+  std::vector<std::function<void()>> tasks;
+  {
+    std::lock_guard lock(mutex);
+    tasks.swap(posted);
+  }
+  for (const auto& task : tasks) task();
+  bool headway = false;
+  for (const auto& effect : effects) {
+    const bool well = effect->Tick().ok();
+    headway |= well && Session::WorkOf(*effect) != Session::Work::none;
+  }
+  return headway;
+}
 
 }  // namespace
 
@@ -54,13 +73,7 @@ void Session::Remove(Effect& effect) {
 
 void Session::Tick() {
   CheckThread();
-  std::vector<std::function<void()>> tasks;
-  {
-    std::lock_guard lock(posted_mutex_);
-    tasks.swap(posted_);
-  }
-  for (const auto& task : tasks) task();
-  for (const auto& effect : effects_) effect->Tick();
+  TickAll(posted_mutex_, posted_, effects_);
 }
 
 int Session::StatusOf(const Effect& effect) {
@@ -79,9 +92,11 @@ Session::Wait Session::TickUntilSettled(std::chrono::milliseconds timeout,
                                         const std::function<bool()>& stop) {
   using Clock = std::chrono::steady_clock;
   const Clock::time_point end = Clock::now() + timeout;
-  for (int ticks = 1;; ++ticks) {
+  CheckThread();
+  for (int ticks = 1, failed = 0;; ++ticks) {
     const Clock::time_point begin = Clock::now();
-    Tick();
+    failed = TickAll(posted_mutex_, posted_, effects_) ? 0 : failed + 1;
+    if (failed == kFailedTicks) return Wait::settled;
     if (stop && stop()) return Wait::stopped;
     if (ticks >= kTicksBeforeALook) {
       if (std::all_of(effects_.begin(), effects_.end(), [](const std::unique_ptr<Effect>& effect) {

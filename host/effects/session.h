@@ -47,8 +47,8 @@ class Session {
 
   enum class Wait { settled, stopped, timed_out };
   // Ticks all effects, some 20 times a second and whenever one wants a re-render, until none has
-  // work left. Each is ticked three times before it is first looked at, since work begins in ticks.
-  // `stop` is asked after each round; may be null.
+  // work left, or the ticks of those that have keep failing. Looks first after three ticks, since
+  // work begins in ticks. `stop` is asked after each round; may be null.
   Wait TickUntilSettled(std::chrono::milliseconds timeout, const std::function<bool()>& stop = {});
 
   // Runs the task on the session's thread, in its next tick; wakes TickUntilSettled. Any thread.

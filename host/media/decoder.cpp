@@ -15,6 +15,18 @@ namespace {
   throw Failure(Failure::Side::input, path + ": " + cause);
 }
 
+// A damaged file asks for any amount.
+[[noreturn]] void FailForMemory(const std::string& path) {
+  Fail(path, "takes more memory than there is, or is damaged");
+}
+
+// FFmpeg's words, but for those that say no more than that it failed.
+[[noreturn]] void Fail(const std::string& path, const std::string& cause, int error) {
+  if (error == AVERROR(ENOMEM)) FailForMemory(path);
+  const bool says_more = error != AVERROR_INVALIDDATA && error != AVERROR_EOF;
+  Fail(path, says_more ? cause + ": " + ErrorText(error) : cause);
+}
+
 // Many damaged packets in a row end the stream: some demuxers return the same error for ever.
 constexpr int kErrorLimit = 1000;
 
@@ -31,15 +43,15 @@ InputPtr OpenInput(const std::string& path) {
 
   AVFormatContext* opened = nullptr;
   AVDictionary* options = nullptr;
-  av_dict_set(&options, "protocol_whitelist", "file", 0);
+  if (av_dict_set(&options, "protocol_whitelist", "file", 0) < 0) throw std::bad_alloc();
   int error = avformat_open_input(&opened, ("file:" + path).c_str(), nullptr, &options);
   av_dict_free(&options);
-  if (error < 0) Fail(path, "not a video file, or damaged at its start: " + ErrorText(error));
+  if (error < 0) Fail(path, "not a video file, or damaged at its start", error);
   InputPtr container(opened);
   // Text is shown as pictures by this one.
   if (std::string_view(container->iformat->name) == "tty") Fail(path, "not a video file");
   error = avformat_find_stream_info(container.get(), nullptr);
-  if (error < 0) Fail(path, "its streams can't be read: " + ErrorText(error));
+  if (error < 0) Fail(path, "its streams can't be read", error);
   return container;
 }
 
@@ -68,6 +80,9 @@ void Decoder::Open() {
     Fail(path_, "frames of " + std::to_string(parameters.width) + " x " +
                     std::to_string(parameters.height) + " pixels are too large");
   }
+  if (parameters.codec_id == AV_CODEC_ID_NONE) {
+    Fail(path_, "its video is of a kind that is not known, or it is damaged at its start");
+  }
   const AVCodec* decoder = avcodec_find_decoder(parameters.codec_id);
   if (!decoder) {
     Fail(path_, std::string("no decoder for ") + avcodec_get_name(parameters.codec_id));
@@ -79,13 +94,13 @@ void Decoder::Open() {
   codec_->thread_type = FF_THREAD_FRAME | FF_THREAD_SLICE;
   codec_->max_pixels = kMaximumPixels;
   if (error >= 0) error = avcodec_open2(codec_.get(), decoder, nullptr);
-  if (error < 0) Fail(path_, std::string("decoder ") + decoder->name + ": " + ErrorText(error));
+  if (error < 0) Fail(path_, std::string("decoder ") + decoder->name + " can't begin", error);
 }
 
 bool Decoder::Feed() {
   while (!draining_) {
     const int error = av_read_frame(container_.get(), packet_.get());
-    if (error == AVERROR(ENOMEM)) throw std::bad_alloc();
+    if (error == AVERROR(ENOMEM)) FailForMemory(path_);
     if (error < 0 && error != AVERROR_EOF && ++errors_in_a_row_ < kErrorLimit) {
       ++damage_;
       // Only such a demuxer is worth asking again; a failing disk stays as it is.
@@ -109,7 +124,7 @@ bool Decoder::Feed() {
     if (packet_->flags & AV_PKT_FLAG_CORRUPT) ++damage_;
     const int sent = avcodec_send_packet(codec_.get(), packet_.get());
     av_packet_unref(packet_.get());
-    if (sent == AVERROR(ENOMEM)) throw std::bad_alloc();
+    if (sent == AVERROR(ENOMEM)) FailForMemory(path_);
     if (sent < 0) ++damage_;
     return true;
   }
@@ -126,7 +141,7 @@ FramePtr Decoder::Next() {
       return frame;
     }
     if (error == AVERROR_EOF) return nullptr;
-    if (error == AVERROR(ENOMEM)) throw std::bad_alloc();
+    if (error == AVERROR(ENOMEM)) FailForMemory(path_);
     if (error == AVERROR(EAGAIN)) {
       if (!Feed()) return nullptr;
       continue;

@@ -58,12 +58,18 @@ AVRational FrameRate(const AVStream& stream, const std::vector<FrameTime>& times
 }
 
 void RepairTimes(const AVStream& stream, bool fields, std::vector<FrameTime>& times) {
-  std::int64_t nominal = 1;
-  if (stream.avg_frame_rate.num > 0 && stream.avg_frame_rate.den > 0) {
-    // Bounded, that a stream's worth of them has a place after its latest time.
-    nominal =
-        std::clamp<std::int64_t>(av_rescale_q(1, av_inv_q(stream.avg_frame_rate), stream.time_base),
-                                 1, std::int64_t{1} << 36);
+  AVRational rate{25, 1};
+  for (const AVRational told : {stream.r_frame_rate, stream.avg_frame_rate}) {
+    if (told.num > 0 && told.den > 0) rate = told;
+  }
+  // Bounded, that a stream's worth of them has a place after its latest time.
+  const std::int64_t nominal = std::clamp<std::int64_t>(
+      av_rescale_q(1, av_inv_q(rate), stream.time_base), 1, std::int64_t{1} << 36);
+  // One that its neighbours contradict is none, lest all that follow it crowd behind it.
+  for (std::size_t i = 1; i + 1 < times.size(); ++i) {
+    const std::int64_t before = times[i - 1].pts, after = times[i + 1].pts;
+    const bool known = before != AV_NOPTS_VALUE && after != AV_NOPTS_VALUE;
+    if (known && before < after && times[i].pts > after) times[i].pts = AV_NOPTS_VALUE;
   }
   for (std::size_t i = 0; i < times.size(); ++i) {
     std::int64_t& pts = times[i].pts;

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <memory>
 
 #include "host/media/decoder.h"
 
@@ -17,6 +18,14 @@ std::uint32_t TagFor(const AVOutputFormat& format, const AVCodecParameters& para
   return keeps ? parameters.codec_tag : 0;
 }
 
+void CopyTags(const AVDictionary* from, AVDictionary*& to) {
+  if (av_dict_copy(&to, from, 0) < 0) throw std::bad_alloc();
+}
+
+void CopySideData(const AVPacketSideData& data, AVStream& to) {
+  std::memcpy(NotNull(av_stream_new_side_data(&to, data.type, data.size)), data.data, data.size);
+}
+
 bool AddStream(const AVStream& from, AVFormatContext& output) {
   AVStream* to = NotNull(avformat_new_stream(&output, nullptr));
   if (avcodec_parameters_copy(to->codecpar, from.codecpar) < 0) return false;
@@ -26,12 +35,8 @@ bool AddStream(const AVStream& from, AVFormatContext& output) {
   to->sample_aspect_ratio = from.sample_aspect_ratio;
   to->avg_frame_rate = from.avg_frame_rate;
   to->r_frame_rate = from.r_frame_rate;
-  av_dict_copy(&to->metadata, from.metadata, 0);
-  for (int i = 0; i < from.nb_side_data; ++i) {
-    const AVPacketSideData& data = from.side_data[i];
-    std::uint8_t* copy = av_stream_new_side_data(to, data.type, data.size);
-    if (copy) std::memcpy(copy, data.data, data.size);
-  }
+  CopyTags(from.metadata, to->metadata);
+  for (int i = 0; i < from.nb_side_data; ++i) CopySideData(from.side_data[i], *to);
   return true;
 }
 
@@ -39,6 +44,8 @@ bool AddStream(const AVStream& from, AVFormatContext& output) {
 bool Takes(const AVOutputFormat& format, const AVStream& video, const AVStream& stream) {
   AVFormatContext* trial = nullptr;
   if (avformat_alloc_output_context2(&trial, &format, nullptr, nullptr) < 0) return false;
+  const std::unique_ptr<AVFormatContext, decltype(&avformat_free_context)> own(
+      trial, avformat_free_context);
   bool taken =
       AddStream(video, *trial) && AddStream(stream, *trial) && avio_open_dyn_buf(&trial->pb) >= 0;
   if (taken) {
@@ -48,7 +55,6 @@ bool Takes(const AVOutputFormat& format, const AVStream& video, const AVStream& 
     av_free(bytes);
     trial->pb = nullptr;
   }
-  avformat_free_context(trial);
   return taken;
 }
 
@@ -82,7 +88,7 @@ StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVForma
     }
     to_[static_cast<int>(i)] = static_cast<int>(output.nb_streams) - 1;
   }
-  av_dict_copy(&output.metadata, input_->metadata, 0);
+  CopyTags(input_->metadata, output.metadata);
   for (const char* key : {"major_brand", "minor_version", "compatible_brands", "encoder"}) {
     av_dict_set(&output.metadata, key, nullptr, 0);
   }
@@ -90,7 +96,7 @@ StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVForma
 }
 
 void StreamCopy::CopyVideoProperties(const AVStream& from, AVStream& to) {
-  av_dict_copy(&to.metadata, from.metadata, 0);
+  CopyTags(from.metadata, to.metadata);
   for (const char* key : {"rotate", "encoder", "DURATION", "BPS", "NUMBER_OF_BYTES"}) {
     av_dict_set(&to.metadata, key, nullptr, 0);
   }
@@ -101,11 +107,9 @@ void StreamCopy::CopyVideoProperties(const AVStream& from, AVStream& to) {
       case AV_PKT_DATA_MASTERING_DISPLAY_METADATA:
       case AV_PKT_DATA_CONTENT_LIGHT_LEVEL:
       case AV_PKT_DATA_STEREO3D:
-      case AV_PKT_DATA_SPHERICAL: {
-        std::uint8_t* copy = av_stream_new_side_data(&to, data.type, data.size);
-        if (copy) std::memcpy(copy, data.data, data.size);
+      case AV_PKT_DATA_SPHERICAL:
+        CopySideData(data, to);
         break;
-      }
       default:
         break;  // about the old encoding, or applied to the pixels
     }
@@ -126,8 +130,8 @@ void StreamCopy::CopyChapters() {
     to->time_base = from.time_base;
     to->start = std::max<std::int64_t>(from.start - shift, 0);
     to->end = std::max(from.end - shift, to->start);
-    av_dict_copy(&to->metadata, from.metadata, 0);
     output_.chapters[output_.nb_chapters++] = to;
+    CopyTags(from.metadata, to->metadata);
   }
 }
 

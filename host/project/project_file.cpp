@@ -37,6 +37,11 @@ static_assert(kApplicationId == 1130458221);
   throw ProjectFailure(path + ": " + cause);
 }
 
+[[noreturn]] void FailForSize(const std::string& path, std::size_t most) {
+  Fail(path, "its results take more than " + std::to_string(most) +
+                 " bytes, the most that a project holds");
+}
+
 // SQLite's refusals in a user's words.
 [[noreturn]] void Fail(const std::string& path, const SqliteError& error) {
   switch (error.code) {
@@ -208,7 +213,8 @@ void Replace(const fs::path& path, const Project& project) {
 
 }  // namespace
 
-void SaveProject(const std::string& path, const Project& project) try {
+void SaveProject(const std::string& path, const Project& project, std::size_t most) try {
+  if (project.effect.instance.size() > most) FailForSize(path, most);
   std::error_code error;
   const fs::path place = fs::weakly_canonical(fs::absolute(path), error);
   Project saved = project;
@@ -226,7 +232,7 @@ void SaveProject(const std::string& path, const Project& project) try {
   Fail(path, error.code().message());
 }
 
-Project LoadProject(const std::string& path) try {
+Project LoadProject(const std::string& path, std::size_t most) try {
   std::error_code error;
   if (!fs::exists(path, error)) Fail(path, "is not there");
   // For writing, since an interrupted save is first taken back; SQLite does without where it must.
@@ -239,9 +245,10 @@ Project LoadProject(const std::string& path) try {
   while (parameter.Step()) {
     project.effect.values[static_cast<std::int32_t>(parameter.Integer(0))] = parameter.Real(1);
   }
-  SqliteStatement instance(database, "SELECT bytes FROM instance");
+  SqliteStatement instance(database, "SELECT length(bytes), bytes FROM instance");
   if (!instance.Step()) throw SqliteError(SQLITE_CORRUPT, "instance");
-  project.effect.instance = instance.Bytes(0);
+  if (instance.Integer(0) > static_cast<std::int64_t>(most)) FailForSize(path, most);
+  project.effect.instance = instance.Bytes(1);
   Guid checksum;
   SettingReader{setting}(kChecksum, checksum);
   if (checksum != ChecksumOf(project) || project.ticks_per_frame <= 0) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <stdexcept>
 #include <string>
@@ -29,14 +30,19 @@ class ProjectFailure : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
+// Of a flattened instance; SQLite holds not much more in one row.
+constexpr std::size_t kMaximumInstanceBytes = std::size_t{900} << 20;
+
 // The project's paths are made from clip_path and the project's own place. Whatever ends the
 // program or the machine meanwhile, the file is the last project or this one, whole. Several
 // programs may save to one file; each waits for the other. Throws ProjectFailure; then the file is
-// as it was.
-void SaveProject(const std::string& path, const Project& project);
+// as it was. An instance of more than `most` bytes is refused.
+void SaveProject(const std::string& path, const Project& project,
+                 std::size_t most = kMaximumInstanceBytes);
 
-// Throws ProjectFailure: not there or not readable, no project, damaged, of a newer version.
-Project LoadProject(const std::string& path);
+// Throws ProjectFailure: not there or not readable, no project, damaged, of a newer version, too
+// large, which is found before it is read.
+Project LoadProject(const std::string& path, std::size_t most = kMaximumInstanceBytes);
 
 // Where the project's clip lies now: at its place relative to the project, at its old place, or
 // beside the project. Throws ProjectFailure when it is nowhere, or is another clip by now.

@@ -70,8 +70,13 @@ bool SqliteStatement::Step() {
   return false;
 }
 
+void SqliteStatement::CheckMemory(const void* value) const {
+  if (!value && sqlite3_errcode(database_.get()) == SQLITE_NOMEM) Check(SQLITE_NOMEM);
+}
+
 std::string SqliteStatement::Text(int column) const {
   const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(statement_, column));
+  CheckMemory(text);
   return text
              ? std::string(text, static_cast<std::size_t>(sqlite3_column_bytes(statement_, column)))
              : std::string();
@@ -79,6 +84,7 @@ std::string SqliteStatement::Text(int column) const {
 
 std::vector<std::uint8_t> SqliteStatement::Bytes(int column) const {
   const auto* bytes = static_cast<const std::uint8_t*>(sqlite3_column_blob(statement_, column));
+  CheckMemory(bytes);
   const int size = sqlite3_column_bytes(statement_, column);
   return bytes ? std::vector<std::uint8_t>(bytes, bytes + size) : std::vector<std::uint8_t>();
 }

@@ -58,6 +58,7 @@ class SqliteStatement {
 
  private:
   void Check(int code) const;
+  void CheckMemory(const void* value) const;  // a column's, null where there was none for it
 
   SqliteDatabase& database_;
   sqlite3_stmt* statement_ = nullptr;

@@ -6,8 +6,6 @@
 #include <cstring>
 #include <new>
 
-#include "platform/lapack/lapack.h"
-
 // CHOLMOD keeps matrices by columns. The upper triangle by rows is the lower triangle by columns of
 // the same symmetric matrix, so the arrays are taken as they stand, less the one of their base.
 struct DssSolver {
@@ -62,7 +60,6 @@ bool DiagonalIsPositive(const cholmod_factor& factor) {
 }  // namespace
 
 DssInt dss_create(DssHandle& handle, std::uint32_t) {
-  lapack::UseCallingThreadOnly();
   handle = new (std::nothrow) DssSolver;
   return handle ? MKL_DSS_SUCCESS : MKL_DSS_OUT_OF_MEMORY;
 }

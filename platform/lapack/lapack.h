@@ -5,14 +5,23 @@
 
 // The LAPACK routines that the system uses, with LAPACK's own names, argument order and
 // conventions: column-major, all arguments by pointer, info 0 on success (Anderson et al., LAPACK
-// Users' Guide, 3rd ed., 1999). Before the first call the BLAS beneath is told to use the calling
-// thread only.
+// Users' Guide, 3rd ed., 1999). Each throws std::bad_alloc where the BLAS beneath has no memory.
 namespace lapack {
 
+// Stands around every call of BLAS.
+//
 // Matrices here are small, solves run beside renders that use every processor, and a result must
-// not depend on the number of processors: so BLAS starts no threads of its own. Called by the
-// routines below; dss calls it for its own library.
-void UseCallingThreadOnly();
+// not depend on the number of processors: so BLAS starts no threads of its own.
+//
+// OpenBLAS takes a buffer for each call that is under way, keeps it for later ones, and where there
+// is no memory for it asks again for ever. So throws std::bad_alloc where there is none.
+class BlasCall {
+ public:
+  BlasCall();
+  ~BlasCall();
+  BlasCall(const BlasCall&) = delete;
+  BlasCall& operator=(const BlasCall&) = delete;
+};
 
 // Singular value decomposition A = U diag(s) V'. A is destroyed.
 void dgesvd(const char* jobu, const char* jobvt, const int* m, const int* n, double* a,

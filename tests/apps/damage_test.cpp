@@ -80,16 +80,9 @@ class DamageTest : public ProgramTest {
       const std::string damaged = "damaged" + fs::path(name).extension().string();
       std::ofstream(Path(damaged), std::ios::binary) << Damaged(whole, other, number);
       const bool steadies = number % 2 == 0;
-      const std::string command =
-          "cd '" + folder_.string() + "' && timeout 100 " CALMFRAME_PROGRAM " " +
-          (steadies ? "stabilize " + damaged + " out.mkv" : "analyze " + damaged) + " --quiet 2>&1";
-      Outcome outcome{-1, ""};
-      FILE* pipe = popen(command.c_str(), "r");
-      std::array<char, 512> part;
-      while (std::fgets(part.data(), part.size(), pipe)) outcome.text += part.data();
-      const int status = pclose(pipe);
-      ASSERT_TRUE(WIFEXITED(status));
-      outcome.code = WEXITSTATUS(status);
+      const Outcome outcome = RunAfter(
+          "timeout 100 ",
+          (steadies ? "stabilize " + damaged + " out.mkv" : "analyze " + damaged) + " --quiet");
       EXPECT_THAT(outcome.code, ::testing::AnyOf(0, 3, 5)) << outcome.text;
       if (outcome.code != 0) ExpectOneLine(outcome, "");
       std::vector<std::string> expected = {damaged, name};

@@ -42,14 +42,19 @@ class ProgramTest : public ::testing::Test {
 
   std::string Path(const std::string& name) const { return folder_ / name; }
 
-  Outcome Run(const std::string& arguments) const {
-    const std::string command =
-        "cd '" + folder_.string() + "' && " CALMFRAME_PROGRAM " " + arguments + " 2>&1";
+  Outcome Run(const std::string& arguments) const { return RunAfter("", arguments); }
+
+  // `before` stands before the program in the shell's line. A program that a signal ended has the
+  // code -1.
+  Outcome RunAfter(const std::string& before, const std::string& arguments) const {
+    const std::string command = "cd '" + folder_.string() + "' && { " + before +
+                                CALMFRAME_PROGRAM " " + arguments + "; } 2>&1";
     Outcome outcome{-1, ""};
     FILE* pipe = popen(command.c_str(), "r");
     std::array<char, 512> part;
     while (std::fgets(part.data(), part.size(), pipe)) outcome.text += part.data();
-    outcome.code = WEXITSTATUS(pclose(pipe));
+    const int status = pclose(pipe);
+    if (WIFEXITED(status)) outcome.code = WEXITSTATUS(status);
     return outcome;
   }
 

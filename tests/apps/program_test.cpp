@@ -237,5 +237,26 @@ TEST_F(ProgramTest, TheDemoShowsAShakyAndASteadyClip) {
   EXPECT_EQ(ClipReader::Open(Path("here/steady.mp4"))->info().frame_count, 12u);
 }
 
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)  // these need all of it
+TEST_F(ProgramTest, WithoutMemoryItEndsInOneLineAndLeavesNothing) {
+  MakeClip("in.mp4", 96, 64, 6);
+  bool begins = false, ends = false;
+  for (int mib = 128; !ends && mib < 8192; mib += begins ? 32 : 8) {
+    SCOPED_TRACE(mib);
+    const std::string few = "ulimit -c 0; ulimit -v " + std::to_string(mib * 1024) + "; ";
+    begins = begins || RunAfter(few, "--version").code == 0;
+    if (!begins) continue;  // it can't be loaded
+    const Outcome outcome =
+        RunAfter(few + "timeout -s KILL 100 ", "stabilize in.mp4 out.mkv --quiet");
+    ends = outcome.code == 0;
+    EXPECT_THAT(outcome.code, ::testing::AnyOf(0, 3, 4, 5)) << outcome.text;
+    if (!ends) ExpectOneLine(outcome, "");
+    EXPECT_EQ(Files().size(), ends ? 2u : 1u);
+    if (HasFailure()) return;
+  }
+  EXPECT_TRUE(ends);
+}
+#endif
+
 }  // namespace
 }  // namespace calmframe

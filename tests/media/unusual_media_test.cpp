@@ -208,15 +208,17 @@ TEST_F(UnusualMediaTest, SizeThatChangesOnTheWayIsThatOfTheFirstFrame) {
 }
 
 TEST_F(UnusualMediaTest, TimesBeyondAnyClockAreNone) {
-  for (const char* times : {"9.2e18+4096*N", "if(eq(N\\,2)\\,9.2e18\\,N)", "-9.2e18+4096*N"}) {
+  for (const char* times : {"ts=9.2e18+4096*N", "ts=if(eq(N\\,2)\\,9.2e18\\,2048*N)",
+                            "pts=if(eq(N\\,2)\\,5e17\\,PTS)", "ts=-9.2e18+2048*N"}) {
     SCOPED_TRACE(times);
-    Ffmpeg("-f lavfi -i testsrc2=s=64x48:r=25:d=0.2 -c:v mpeg4 -bsf:v \"setts=ts=" +
+    Ffmpeg("-f lavfi -i testsrc2=s=64x48:r=25:d=0.2 -c:v mpeg4 -bsf:v \"setts=" +
            std::string(times) + "\" " + In("far.nut"));
     const ClipInfo info = ClipReader::Open(In("far.nut"))->info();
     ASSERT_EQ(info.frame_count, 5u);
     EXPECT_GT(info.frame_rate.num, 0);
     EXPECT_GT(info.frame_rate.den, 0);
-    for (std::size_t i = 1; i < 5; ++i) EXPECT_GT(info.times[i].pts, info.times[i - 1].pts);
+    // A 25th of a second.
+    for (std::size_t i = 1; i < 5; ++i) EXPECT_EQ(info.times[i].pts - info.times[i - 1].pts, 2048);
     EXPECT_LT(std::abs(info.times[4].pts), std::int64_t{1} << 61);
   }
 }

@@ -62,6 +62,8 @@ bool StabilizerEffect::ServiceAnalysis(bool from_render) {
     } catch (std::int32_t) {
       ClearMessage(context());
     }
+    // Before the analysis goes on: a host that never heard of it would not wait for it.
+    if (own->unpublished != FrameStatus::None) PublishStatus(own->unpublished);
   }
   if (AnalysisEffect::ServiceAnalysis(from_render)) return true;
   StabilizerState* const state = GetState();
@@ -69,7 +71,6 @@ bool StabilizerEffect::ServiceAnalysis(bool from_render) {
     PublishSharedData();
     return false;
   }
-  if (state->unpublished != FrameStatus::None) PublishStatus(state->unpublished);
   if (state->solver) {
     const Solver::State status = state->solver->GetState();
     if (status == Solver::finished || status == Solver::failed) FinishSolve(*state);
@@ -142,6 +143,9 @@ bool StabilizerEffect::StartSolveIfNeeded(StabilizerState& state) {
 }
 
 void StabilizerEffect::FinishSolve(StabilizerState& state) {
+  if (state.solver->GetState() == Solver::failed && state.solver->OutOfMemory()) {
+    ReportOutOfMemory();
+  }
   state.TakeSolve();
   const FrameStatus status =
       state.phase == SolvePhase::Solved ? FrameStatus::Ready : FrameStatus::SolveFailed;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <atomic>
 #include <boost/make_shared.hpp>
+#include <new>
 #include <stdexcept>
 #include <utility>
 
@@ -42,6 +43,7 @@ class Solver::Core {
   boost::shared_ptr<const cropper> cropperResult;
   const boost::function<void()> notify;
   std::atomic<std::uint32_t> state{not_started};
+  bool outOfMemory = false;  // before the state is failed
   std::atomic<std::int64_t> cancelFlag{0};
   std::atomic<std::uint64_t> cancelPolls{0};
   std::atomic<float> progressShare{0};
@@ -111,6 +113,10 @@ std::uint64_t Solver::GetPollCount() const {
   return core_->cancelPolls.load(std::memory_order_relaxed);
 }
 
+bool Solver::OutOfMemory() const {
+  return core_->outOfMemory;
+}
+
 const Solver::Inputs& Solver::inputs() const {
   return core_->inputs;
 }
@@ -144,6 +150,9 @@ void Solver::Core::Run() {
     if (inputs.needsCropper) cropperResult = MakeCropper();
   } catch (const CancelException&) {
     end = cancelled;
+  } catch (const std::bad_alloc&) {
+    outOfMemory = true;
+    end = failed;
   } catch (...) {
     end = failed;
   }

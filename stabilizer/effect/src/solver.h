@@ -71,6 +71,8 @@ class Solver {
   const Inputs& inputs() const;
   bool warper_supplied() const;
 
+  // Whether that is why it failed. To be read once the state is failed.
+  bool OutOfMemory() const;
   // Results. To be read once the state is finished.
   const boost::shared_ptr<const marrow::stabilization::CPWarper>& GetWarper() const;
   const boost::shared_ptr<const cropper>& GetCropper() const;

@@ -129,6 +129,12 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
         << c.name;
     EXPECT_EQ(fs::file_size(Path(c.name)), size) << c.name;
   }
+  SaveProject(Path("large.calm"), Sample(1, 5000), 5000);
+  ExpectSame(LoadProject(Path("large.calm"), 5000), Sample(1, 5000));
+  EXPECT_THAT(Refusal([&] { LoadProject(Path("large.calm"), 4999); }), HasSubstr("than 4999 byte"));
+  EXPECT_THAT(Refusal([&] { SaveProject(Path("large.calm"), Sample(2, 5001), 5000); }),
+              HasSubstr("than 5000 byte"));
+  EXPECT_EQ(LoadProject(Path("large.calm")).length, Sample(1).length);
   EXPECT_THAT(Refusal([&] { LoadProject(Path("missing.calm")); }), HasSubstr("is not there"));
   EXPECT_NE(Refusal([&] { SaveProject(Path("no/such/folder.calm"), Sample(1)); }), "");
 }

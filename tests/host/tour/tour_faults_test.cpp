@@ -83,6 +83,29 @@ TEST_F(TourFaults, AMissingSuiteIsSurvived) {
   }
 }
 
+// A host that never heard of an analysis would not wait for its end.
+TEST_F(TourFaults, AStatusThatCouldNotBeToldIsToldWithTheNextTick) {
+  Session::PauseBackgroundWork(true);
+  Operations::Get().FailNth(1, "Param Utils.SetParamValue");
+  Effect& effect = session().Apply(MakeLayer(kClip));
+  EXPECT_EQ(effect.Tick().code, kFaultCode);
+  EXPECT_EQ(Session::StatusOf(effect), 0);
+  EXPECT_TRUE(effect.Tick().ok());
+  EXPECT_EQ(Session::StatusOf(effect), 4);
+  Session::PauseBackgroundWork(false);
+  EXPECT_EQ(Settle(effect), 8);
+  // One that was told of and can't begin is over.
+  EXPECT_TRUE(effect.SetParam(kDetailedAnalysis, 1).ok());
+  EXPECT_EQ(Session::StatusOf(effect), 4);
+  Operations::Get().FailAlways("Video Segment.GetSegmentNodeAt");
+  EXPECT_FALSE(effect.Tick().ok());
+  EXPECT_EQ(Session::WorkOf(effect), Session::Work::none);
+  Operations::Get().FailNone();
+  EXPECT_TRUE(effect.Tick().ok());
+  EXPECT_TRUE(effect.Press(kAnalyze).ok());
+  EXPECT_EQ(Settle(effect), 8);
+}
+
 // The operations of a tour by name: the first, the second and the last, which other threads' make
 // another one each time; all of them where the environment wants it.
 TEST_F(TourFaults, AFailingOperationIsSurvivedWhicheverItIs) {
