@@ -10,11 +10,6 @@
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
-namespace {
-
-constexpr std::int32_t kAutoScaleGroup = 17;  // disk id; its name tells the scale
-
-}  // namespace
 
 AnalyzeCommand::AnalyzeCommand(CLI::App& program)
     : command_(program.add_subcommand(
@@ -40,8 +35,8 @@ void AnalyzeCommand::Run() {
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
   const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
-  const std::unique_ptr<CropWindow> crop = clip.Crop();
   if (run_.json) {
+    const std::unique_ptr<CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;
     json["clip"] = input_;
     json["width"] = info.width;
@@ -56,10 +51,7 @@ void AnalyzeCommand::Run() {
   }
   std::printf("%s: %zu frames of %dx%d\n", input_.c_str(), info.frame_count, info.width,
               info.height);
-  if (crop) {
-    std::printf("crop window %dx%d, %s\n", crop->width, crop->height,
-                clip.NameOf(kAutoScaleGroup).c_str());
-  }
+  if (const std::string text = clip.CropText(); !text.empty()) std::printf("%s\n", text.c_str());
   unsaved.Throw();
 }
 

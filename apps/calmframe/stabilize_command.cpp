@@ -9,24 +9,31 @@
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
-void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
+
+CropTrouble CropTroubleOf(SteadyClip& clip) {
   const std::unique_ptr<CropWindow> crop = clip.Crop();
-  if (!crop) return;
+  if (!crop) return {};
   if (crop->width <= 0 || crop->height <= 0) {
-    throw SolveFailure(
-        "no part of the picture stays in view; set --framing stabilize-only or adjust other flags");
+    return {
+        "no part of the picture stays in view; set --framing stabilize-only or adjust other flags",
+        true};
   }
   constexpr double kSmall = 0.4;  // of a side
   const media::ClipInfo& info = clip.info();
   const double width = static_cast<double>(info.width) *
                        static_cast<double>(info.pixel_aspect.num) /
                        static_cast<double>(info.pixel_aspect.den);
-  if (crop->width < kSmall * width || crop->height < kSmall * info.height) {
-    progress.Warn("of " + std::to_string(info.width) + "x" + std::to_string(info.height) +
-                  " pixels only " + std::to_string(crop->width) + "x" +
-                  std::to_string(crop->height) +
-                  " stay in view; less --smoothness or --framing stabilize-only keeps more");
-  }
+  if (crop->width >= kSmall * width && crop->height >= kSmall * info.height) return {};
+  return {"of " + std::to_string(info.width) + "x" + std::to_string(info.height) + " pixels only " +
+              std::to_string(crop->width) + "x" + std::to_string(crop->height) +
+              " stay in view; less --smoothness or --framing stabilize-only keeps more",
+          false};
+}
+
+void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
+  const CropTrouble trouble = CropTroubleOf(clip);
+  if (trouble.nothing_seen) throw SolveFailure(trouble.line);
+  if (!trouble.line.empty()) progress.Warn(trouble.line);
 }
 
 namespace {

@@ -154,10 +154,6 @@ std::string SvgOf(const Plot& plot, double seconds_a_value) {
            Coordinate(kLeft - 6) + "\" y=\"" + y + "\" class=\"y\">" +
            Short(tick, DigitsOf(y_step)) + "</text>\n";
   }
-  if (!plot.unit.empty()) {
-    svg += "<text x=\"" + Coordinate(kLeft + 4) + "\" y=\"" + Coordinate(kTop + 4) +
-           "\" class=\"unit\">" + Escaped(plot.unit) + "</text>\n";
-  }
   const double t_step = StepOf(seconds, 8);
   for (double tick = 0; tick <= seconds + t_step * 1e-6; tick += t_step) {
     const std::string x = Coordinate(kLeft + tick / seconds * (kWidth - kLeft - kRight));

@@ -54,10 +54,12 @@ class ProgramTest : public ::testing::Test {
   }
 
   // A clip of the synthetic scene.
-  void MakeClip(const std::string& name, int width, int height, int frames) const {
+  void MakeClip(const std::string& name, int width, int height, int frames,
+                media::Ratio pixel_aspect = {}) const {
     ClipInfo info;
     info.width = width;
     info.height = height;
+    info.pixel_aspect = pixel_aspect;
     info.frame_rate = {30, 1};
     info.frame_count = static_cast<std::size_t>(frames);
     const auto writer = ClipWriter::Create(Path(name), info, width, height, {});

@@ -137,6 +137,28 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
   }
 }
 
+TEST_F(ReportTest, WithoutItsClipThePageHasAllButThePictures) {
+  MakeClip("wide.mkv", 160, 120, 20, {64, 45});
+  const Outcome told = Run("analyze wide.mkv --project w.calm --quiet");
+  ASSERT_EQ(told.code, 0) << told.text;
+  ASSERT_EQ(Run("report w.calm with.html --quiet").code, 0);
+  fs::rename(Path("wide.mkv"), Path("elsewhere"));
+  const Outcome outcome = Run("report w.calm without.html --quiet");
+  EXPECT_EQ(outcome.code, 0);
+  ExpectOneLine(outcome, "wide.mkv is gone; the page has no pictures");
+  const std::string page = Content("without.html");
+  EXPECT_THAT(page, HasSubstr("wide.mkv is gone; the page has no pictures</li>"));
+  EXPECT_EQ(page.find("<img"), std::string::npos);
+  EXPECT_EQ(DataOf(page), DataOf(Content("with.html")));
+  // The result is told as analyze tells it.
+  const std::string crop = told.text.substr(told.text.find("crop window"));
+  EXPECT_THAT(page, HasSubstr(crop.substr(0, crop.find('\n'))));
+  // Another clip in its place is none of its pictures.
+  MakeClip("wide.mkv", 160, 120, 6);
+  ExpectOneLine(Run("report w.calm other.html --quiet"), "is not the clip");
+  EXPECT_EQ(Content("other.html").find("<img"), std::string::npos);
+}
+
 TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
   MakeClip("in.mp4", 160, 120, 20);
   ASSERT_EQ(Run("analyze in.mp4 --project p.calm --quiet").code, 0);
@@ -178,8 +200,8 @@ TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
     EXPECT_EQ(path.find("nan"), std::string::npos) << plot;
   }
   std::size_t pictures = 0;
-  for (std::size_t at = 0; (at = dom.find("src=\"data:image/png;base64,", at)) != std::string::npos;
-       ++at) {
+  for (std::size_t at = 0;
+       (at = dom.find("src=\"data:image/jpeg;base64,", at)) != std::string::npos; ++at) {
     ++pictures;
   }
   EXPECT_EQ(pictures, 12u);
