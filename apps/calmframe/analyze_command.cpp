@@ -49,8 +49,8 @@ void AnalyzeCommand::Run() {
     std::printf("%s\n", json.dump().c_str());
     return unsaved.Throw();
   }
-  std::printf("%s: %zu frames of %dx%d\n", input_.c_str(), info.frame_count, info.width,
-              info.height);
+  std::printf("%s: %zu %s of %dx%d\n", input_.c_str(), info.frame_count,
+              info.frame_count == 1 ? "frame" : "frames", info.width, info.height);
   if (const std::string text = clip.CropText(); !text.empty()) std::printf("%s\n", text.c_str());
   unsaved.Throw();
 }

@@ -204,8 +204,10 @@ void ReportCommand::Run() {
   page.title = NameOf(clip->path());
   page.facts = {
       {"Clip", std::to_string(info.width) + " x " + std::to_string(info.height) + ", " +
-                   report::Short(rate, 3) + " frames a second"},
-      {"Length", std::to_string(info.frame_count) + " frames, " +
+                   report::Short(rate, 3) + " frames a second" +
+                   (info.field_order == media::FieldOrder::progressive ? "" : ", interlaced")},
+      {"Length", std::to_string(info.frame_count) +
+                     (info.frame_count == 1 ? " frame, " : " frames, ") +
                      report::Short(static_cast<double>(info.frame_count) / rate, 2) + " s"}};
   const auto note = [&](const std::string& line) {
     if (line.empty()) return;
@@ -233,6 +235,7 @@ void ReportCommand::Run() {
     if (saved) clip->SolveAnew(progress);
     report::AddSolve(solved, solve_log.Scores(rows), page);
     report::AddEmptyShares(empty, rows, page);
+    if (rows < 2) page.plots.clear();  // of points nothing can be read
   }
 
   std::ofstream out(file.temporary(), std::ios::binary | std::ios::trunc);

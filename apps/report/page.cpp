@@ -23,7 +23,7 @@ table { width: 100%; border-collapse: collapse; background: var(--card); border:
 caption { text-align: left; font-weight: 600; padding: 0 0 6px; }
 th, td { text-align: left; vertical-align: top; padding: 5px 12px; border-top: 1px solid var(--line); overflow-wrap: anywhere; }
 tr:first-child > * { border-top: 0; }
-th { font-weight: 400; color: var(--soft); width: 46%; }
+th { font-weight: 400; color: var(--soft); width: 1%; white-space: nowrap; }
 td { font-variant-numeric: tabular-nums; }
 .notes { background: var(--card); border: 1px solid var(--line); border-left: 4px solid var(--c0); border-radius: 6px; padding: 8px 14px; margin: 18px 0 0; list-style: none; }
 figure { margin: 0 0 16px; background: var(--card); border: 1px solid var(--line); border-radius: 8px; padding: 12px 14px 8px; break-inside: avoid; }
@@ -51,8 +51,8 @@ svg .cursor { stroke: var(--soft); display: none; }
 .film span { position: absolute; left: 6px; bottom: 6px; padding: 0 7px; border-radius: 9px; background: rgb(0 0 0 / 60%); color: #fff; font-size: 12px; line-height: 18px; }
 .film figcaption { margin: 0; color: var(--soft); }
 footer { color: var(--soft); font-size: 13px; margin-top: 40px; }
-@media (max-width: 640px) { svg text { font-size: 19px; } }
-@media print { :root { color-scheme: light; --back: #fff; } body { max-width: none; padding: 0; } }
+@media (max-width: 640px) { svg.plot { overflow: visible; margin-bottom: 6px; } svg text { font-size: 23px; } svg .x { transform: translateY(9px); } }
+@media print { :root { color-scheme: light; --back: #fff; } body { max-width: none; padding: 0; } h2 { break-after: avoid; } section.cards { break-inside: avoid; } }
 </style>
 )html";
 

@@ -144,7 +144,7 @@ std::string SvgOf(const Plot& plot, double seconds_a_value) {
                     Coordinate(kWidth) + " " + Coordinate(kHeight) +
                     "\" role=\"img\" data-count=\"" + std::to_string(count) + "\" aria-label=\"" +
                     Escaped(plot.title + ". " + plot.about) + "\">\n";
-  const double y_step = StepOf(range.high - range.low, 4);
+  const double y_step = StepOf(range.high - range.low, 5);
   for (double tick = std::ceil(range.low / y_step) * y_step; tick <= range.high + y_step * 1e-6;
        tick += y_step) {
     const std::string y =

@@ -73,7 +73,6 @@ void AddTracks(const SolvedClip& solved, Page& page) {
        10,
        true});
   std::vector<int> tracked = solved.tracked;
-  if (tracked.empty()) return;
   std::sort(tracked.begin(), tracked.end());
   page.facts.push_back(
       {"Tracks a " + solved.row, std::to_string(tracked[tracked.size() / 2]) + " on the median, " +
@@ -118,8 +117,12 @@ void AddCrop(const SolvedClip& solved, Page& page) {
 }  // namespace
 
 void AddSolve(const SolvedClip& solved, const std::vector<double>& scores, Page& page) {
-  AddPath(solved, page);
-  AddTracks(solved, page);
+  if (solved.track_life > 0) {
+    AddPath(solved, page);
+    AddTracks(solved, page);
+  } else {
+    page.notes.push_back("Nothing to track was found: the frames stay as they are.");
+  }
   AddModels(scores, page);
   AddCrop(solved, page);
 }

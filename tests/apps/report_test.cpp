@@ -51,6 +51,16 @@ class ReportTest : public ProgramTest {
     writer->Finish();
   }
 
+  void MakeBlankClip(const std::string& name, int frames) const {
+    ClipInfo info;
+    info.frame_rate = {30, 1};
+    info.frame_count = static_cast<std::size_t>(frames);
+    const auto writer = ClipWriter::Create(Path(name), info, 64, 48, {});
+    const std::vector<HX_Pixel8> grey(64 * 48, HX_Pixel8{255, 128, 128, 128});
+    for (int f = 0; f < frames; ++f) writer->Write(f, grey.data(), 64 * 4);
+    writer->Finish();
+  }
+
   std::string Content(const std::string& name) const {
     std::ifstream file(Path(name), std::ios::binary);
     return {std::istreambuf_iterator<char>(file), {}};
@@ -157,6 +167,20 @@ TEST_F(ReportTest, WithoutItsClipThePageHasAllButThePictures) {
   MakeClip("wide.mkv", 160, 120, 6);
   ExpectOneLine(Run("report w.calm other.html --quiet"), "is not the clip");
   EXPECT_EQ(Content("other.html").find("<img"), std::string::npos);
+}
+
+TEST_F(ReportTest, OfNothingNothingIsDrawn) {
+  MakeClip("one.mp4", 64, 48, 1);
+  MakeBlankClip("blank.mp4", 8);
+  for (const std::string name : {"one", "blank"}) {
+    ASSERT_EQ(Run("analyze " + name + ".mp4 --project " + name + ".calm --quiet").code, 0);
+    const Outcome outcome = Run("report " + name + ".calm " + name + ".html --quiet");
+    ASSERT_EQ(outcome.code, 0) << outcome.text;
+    const std::string page = Content(name + ".html");
+    EXPECT_EQ(page.find("id=\"path-x\""), std::string::npos) << name;
+    EXPECT_EQ(page.find(" nan"), std::string::npos) << name;
+  }
+  EXPECT_THAT(Content("blank.html"), HasSubstr("Nothing to track was found"));
 }
 
 TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
