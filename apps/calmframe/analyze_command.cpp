@@ -46,7 +46,7 @@ void AnalyzeCommand::Run() {
       json["crop_width"] = crop->width;
       json["crop_height"] = crop->height;
     }
-    std::printf("%s\n", json.dump().c_str());
+    std::printf("%s\n", JsonLine(json).c_str());
     return unsaved.Throw();
   }
   std::printf("%s: %zu %s of %dx%d\n", input_.c_str(), info.frame_count,

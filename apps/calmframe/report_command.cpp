@@ -175,14 +175,15 @@ std::string NameOf(const std::string& path) {
 }  // namespace
 
 ReportCommand::ReportCommand(CLI::App& program)
-    : command_(program.add_subcommand("report",
-                                      "Show saved work as a page\n\n"
-                                      "Camera path before and after, tracks, models, crop, what is "
-                                      "left empty, and a filmstrip, "
-                                      "in one file for any browser.")) {
+    : command_(program.add_subcommand(
+          "report",
+          "Show saved work as a page\n\n"
+          "Camera path before and after, tracks, models, crop, what is left empty, and a "
+          "filmstrip, in one file for any browser. Where the clip is gone the page has all but the "
+          "filmstrip. Work is saved by stabilize and analyze with --project.")) {
   AddFile(*command_, "PROJECT", project_, "The saved work")->required();
   AddFile(*command_, "OUT", output_, "The page to write, .html")->required();
-  command_->add_flag("--overwrite", overwrite_, "Replace an existing file")->group("Output");
+  command_->add_flag("--overwrite", overwrite_, "Replace OUT where it exists")->group("Output");
   AddRunFlags(*command_, run_);
   command_->footer(
       "Examples:\n"

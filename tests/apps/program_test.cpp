@@ -83,6 +83,10 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
     const char* part;
   } cases[] = {{"stabilise a b", "unknown command stabilise; did you mean stabilize?"},
                {"frobnicate", "unknown command frobnicate ("},
+               {"help frobnicate", "unknown command frobnicate ("},
+               {". b", ". is no command; to steady a clip: calmframe stabilize IN OUT"},
+               {"--smoothness 3 stabilize a b", "the command comes first"},
+               {"stabilize a b -q", "unknown flag -q ("},
                {"stabilize a b --smothness 3", "did you mean --smoothness?"},
                {"stabilize a b --smooth=3", "did you mean --smoothness?"},
                {"info a --smoothness 3", "unknown flag --smoothness (calmframe info --help"},
@@ -129,7 +133,11 @@ TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {
 }
 
 TEST_F(ProgramTest, JsonTellsEachStageAndHowItEnded) {
-  MakeClip("in.mp4", 160, 120, 30);
+  const std::string no_utf8 = "in\xff.mp4";
+  MakeClip(no_utf8, 160, 120, 30);
+  const Outcome analysis = Run("analyze " + no_utf8 + " --json 2>/dev/null");
+  EXPECT_EQ(nlohmann::json::parse(analysis.text)["frames"], 30);
+  fs::rename(Path(no_utf8), Path("in.mp4"));
   const Outcome outcome = Run("stabilize in.mp4 out.mp4 --json --param \"Maximum Scale=120\"");
   EXPECT_EQ(outcome.code, 0) << outcome.text;
   std::vector<std::string> ended;
@@ -197,6 +205,8 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   EXPECT_EQ(tracks.code, 0) << tracks.text;
   EXPECT_EQ(fs::file_size(Path("t.trk")), 20u + 2000 * 40 * 16);
   EXPECT_EQ(Run("tracks away/work.calm away/work.calm").code, 4);  // nothing is written over
+  EXPECT_EQ(Run("tracks away/work.calm t.trk").code, 4);
+  ExpectOneLine(Run("tracks away/work.calm no/t.trk"), "there is no folder no\n");
   const Outcome other = Run("analyze other.mp4 --project away/work.calm");
   EXPECT_EQ(other.code, 3);
   ExpectOneLine(other, "is of another clip");
