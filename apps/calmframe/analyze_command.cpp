@@ -6,6 +6,7 @@
 
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
+#include "apps/calmframe/stabilize_command.h"
 #include "apps/calmframe/steady_clip.h"
 #include "platform/tessel/threads.h"
 
@@ -35,6 +36,9 @@ void AnalyzeCommand::Run() {
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
   const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
+  if (const CropTrouble trouble = CropTroubleOf(clip); !trouble.line.empty()) {
+    progress.Warn(trouble.line);
+  }
   if (run_.json) {
     const std::unique_ptr<CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;

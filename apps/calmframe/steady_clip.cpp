@@ -8,7 +8,6 @@
 #include <cstdio>
 #include <cstring>
 #include <numeric>
-#include <optional>
 #include <utility>
 
 #include "apps/calmframe/failures.h"
@@ -223,16 +222,14 @@ void SteadyClip::CheckResult(ProgressLine& progress) {
 
 void SteadyClip::SolveAnew(ProgressLine& progress) {
   const std::int32_t method = effect_->IndexOf(kMethod);
-  const auto param = effect_->Param(method);
-  const std::optional<double> value = param ? host::ValueOf(*param) : std::nullopt;
-  if (!value) return;
+  const double value = ValueOf(kMethod);
   // A method that is quick to solve for, without a word; with the first one again, nothing of it
   // stands.
   ProgressLine nothing(ProgressLine::Form::none);
   Reuse ignored;
-  effect_->SetParam(method, *value == 1 ? 2.0 : 1.0);
+  effect_->SetParam(method, value == 1 ? 2.0 : 1.0);
   Settle(nothing, ignored);
-  effect_->SetParam(method, *value);
+  effect_->SetParam(method, value);
   Settle(progress, ignored);
   CheckResult(progress);
 }
@@ -294,6 +291,11 @@ std::string SteadyClip::CropText() {
 std::string SteadyClip::NameOf(std::int32_t disk_id) const {
   const auto param = effect_->Param(effect_->IndexOf(disk_id));
   return param ? param->name : "";
+}
+
+double SteadyClip::ValueOf(std::int32_t disk_id) const {
+  const auto param = effect_->Param(effect_->IndexOf(disk_id));
+  return param ? host::ValueOf(*param).value_or(0.0) : 0.0;
 }
 
 void SteadyClip::CheckMedia() {

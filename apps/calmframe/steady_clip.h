@@ -62,6 +62,8 @@ class SteadyClip {
   std::string CropText();
   // The name of a parameter as the effect has it now, of a group with its readout.
   std::string NameOf(std::int32_t disk_id) const;
+  // The value of a parameter as the effect has it now; 0 of one without.
+  double ValueOf(std::int32_t disk_id) const;
 
   // Throws media::Failure when the clip could not be read to its end.
   void CheckMedia();

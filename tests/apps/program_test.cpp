@@ -159,6 +159,14 @@ TEST_F(ProgramTest, AnalyzeTellsWithoutRendering) {
   EXPECT_EQ(plain.code, 0) << plain.text;
   EXPECT_THAT(plain.text, HasSubstr("in.mp4: 30 frames of 160x120\ncrop window "));
   EXPECT_THAT(plain.text, HasSubstr("Auto-scale (1"));
+  // Too little is told, and what is told is enough.
+  const std::string analyze = "analyze in.mp4 --project p.calm --quiet --maximum-scale ";
+  const std::string black = Run(analyze + "101").text;
+  ASSERT_THAT(black, HasSubstr("% of the picture stays black"));
+  const std::size_t scale = black.find("--maximum-scale ");
+  EXPECT_THAT(Run(analyze + black.substr(scale + 16, 3)).text,
+              ::testing::Not(HasSubstr("stays black")));
+  fs::remove(Path("p.calm"));
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4"));
 }
 
