@@ -66,15 +66,13 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
   ExpectOneLine(Run("stabilize in.mp4 out.mp4 --pixel-format yuv420"), "did you mean yuv420p?");
   ExpectOneLine(Run("stabilize in.mp4 no/such/folder.mp4"), "there is no folder no/such\n");
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "there.mp4"));
-  std::ifstream kept(Path("there.mp4"));
-  EXPECT_EQ(std::string(std::istreambuf_iterator<char>(kept), {}), "precious");
+  EXPECT_EQ(Content("there.mp4"), "precious");
   EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet").code, 0);
   EXPECT_EQ(ClipReader::Open(Path("there.mp4"))->info().frame_count, 5u);
   // An encoder that likes to talk, and the tag that players want.
   EXPECT_THAT(Run("stabilize in.mp4 there.mp4 --overwrite --quiet --codec hevc").text,
               ::testing::Not(HasSubstr("x265 [")));
-  std::ifstream hevc(Path("there.mp4"));
-  EXPECT_THAT(std::string(std::istreambuf_iterator<char>(hevc), {}), HasSubstr("hvc1"));
+  EXPECT_THAT(Content("there.mp4"), HasSubstr("hvc1"));
 }
 
 TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {

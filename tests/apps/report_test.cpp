@@ -24,16 +24,9 @@ Place CameraAt(int frame) {
 class ReportTest : public ProgramTest {
  protected:
   void MakeWallClip(const std::string& name) const {
-    ClipInfo info;
-    info.width = kWidth;
-    info.height = kHeight;
-    info.frame_rate = {30, 1};
-    info.frame_count = kFrames;
-    const auto writer = ClipWriter::Create(Path(name), info, kWidth, kHeight, {});
     const synthetic::texture& wall = synthetic::texture_of(synthetic::material::foliage);
-    std::vector<HX_Pixel8> pixels(kWidth * kHeight);
-    for (int f = 0; f < kFrames; ++f) {
-      const Place place = CameraAt(f);
+    const auto draw = [&wall](int frame, HX_Pixel8* pixels) {
+      const Place place = CameraAt(frame);
       const double c = std::cos(place.angle) / place.zoom / wall.side();
       const double s = std::sin(place.angle) / place.zoom / wall.side();
       for (int y = 0; y < kHeight; ++y) {
@@ -46,24 +39,8 @@ class ReportTest : public ProgramTest {
           pixels[y * kWidth + x] = {255, byte(seen[0]), byte(seen[1]), byte(seen[2])};
         }
       }
-      writer->Write(f, pixels.data(), kWidth * 4);
-    }
-    writer->Finish();
-  }
-
-  void MakeBlankClip(const std::string& name, int frames) const {
-    ClipInfo info;
-    info.frame_rate = {30, 1};
-    info.frame_count = static_cast<std::size_t>(frames);
-    const auto writer = ClipWriter::Create(Path(name), info, 64, 48, {});
-    const std::vector<HX_Pixel8> grey(64 * 48, HX_Pixel8{255, 128, 128, 128});
-    for (int f = 0; f < frames; ++f) writer->Write(f, grey.data(), 64 * 4);
-    writer->Finish();
-  }
-
-  std::string Content(const std::string& name) const {
-    std::ifstream file(Path(name), std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
+    };
+    WriteClip(Path(name), Made(kWidth, kHeight, kFrames, 30), draw);
   }
 
   static nlohmann::json DataOf(const std::string& page) {
@@ -171,7 +148,9 @@ TEST_F(ReportTest, WithoutItsClipThePageHasAllButThePictures) {
 
 TEST_F(ReportTest, OfNothingNothingIsDrawn) {
   MakeClip("one.mp4", 64, 48, 1);
-  MakeBlankClip("blank.mp4", 8);
+  WriteClip(Path("blank.mp4"), Made(64, 48, 8, 30), [](int, HX_Pixel8* pixels) {
+    std::fill_n(pixels, 64 * 48, HX_Pixel8{255, 128, 128, 128});
+  });
   for (const std::string name : {"one", "blank"}) {
     ASSERT_EQ(Run("analyze " + name + ".mp4 --project " + name + ".calm --quiet").code, 0);
     const Outcome outcome = Run("report " + name + ".calm " + name + ".html --quiet");

@@ -11,6 +11,7 @@
 
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
+#include "tests/support/scratch_folder.h"
 
 namespace calmframe::host {
 namespace {
@@ -21,14 +22,11 @@ using ::testing::HasSubstr;
 class ProjectTest : public testing::Test {
  protected:
   ProjectTest() {
-    std::string name = (fs::temp_directory_path() / "calmframe-project-XXXXXX").string();
-    folder_ = mkdtemp(name.data());
-    fs::create_directories(folder_ / "clips");
+    fs::create_directories(Path("clips"));
     WriteFile(Path("clips/walk.mp4"), "a walk");
   }
-  ~ProjectTest() override { fs::remove_all(folder_); }
 
-  std::string Path(const std::string& name) const { return folder_ / name; }
+  std::string Path(const std::string& name) const { return folder_.In(name); }
   static void WriteFile(const std::string& path, const std::string& text) {
     std::ofstream(path) << text;
   }
@@ -75,7 +73,7 @@ class ProjectTest : public testing::Test {
     return "";
   }
 
-  fs::path folder_;
+  const ScratchFolder folder_;
 };
 
 TEST_F(ProjectTest, WhatIsSavedComesBackToTheBit) {
@@ -86,7 +84,8 @@ TEST_F(ProjectTest, WhatIsSavedComesBackToTheBit) {
     ExpectSame(LoadProject(path), saved);
   }
   EXPECT_EQ(LoadProject(path).clip_relative, "clips/walk.mp4");
-  EXPECT_EQ(std::distance(fs::directory_iterator(folder_), {}), 2);  // the project and the clips
+  EXPECT_EQ(std::distance(fs::directory_iterator(folder_.path()), {}),
+            2);  // the project and the clips
 }
 
 TEST_F(ProjectTest, TheClipIsFoundWhereverItWentAndKnownWhenItChanged) {
@@ -163,8 +162,7 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
 
 TEST_F(ProjectTest, DamageIsToldAndNeverMore) {
   SaveProject(Path("whole.calm"), Sample(1, 3000));
-  std::ifstream file(Path("whole.calm"), std::ios::binary);
-  const std::string whole{std::istreambuf_iterator<char>(file), {}};
+  const std::string whole = folder_.Content("whole.calm");
   for (std::size_t at = 0; at < whole.size(); at += 97) {
     std::string damaged = whole;
     damaged[at] = static_cast<char>(~damaged[at]);
