@@ -1,6 +1,10 @@
 # Where `cmake --install` puts things, and the Debian package of them. Program, libraries and plug-in find each other by
 # paths relative to themselves, so the tree may be moved. To be included when all targets are there.
 
+# Where Debian looks: the plug-in is of one architecture, and pkg-config asks by that.
+if(CMAKE_LIBRARY_ARCHITECTURE AND EXISTS /etc/debian_version)
+  set(CMAKE_INSTALL_LIBDIR "lib/${CMAKE_LIBRARY_ARCHITECTURE}" CACHE PATH "Where libraries go")
+endif()
 include(GNUInstallDirs)
 set(private_libdir "${CMAKE_INSTALL_LIBDIR}/calmframe")
 file(RELATIVE_PATH private_from_bin "${CMAKE_INSTALL_FULL_BINDIR}" "${CMAKE_INSTALL_FULL_LIBDIR}/calmframe")
@@ -47,7 +51,7 @@ install(FILES "${CMAKE_BINARY_DIR}/changelog.gz" DESTINATION "${CMAKE_INSTALL_DO
 
 set(CPACK_GENERATOR DEB)
 set(CPACK_PACKAGE_VENDOR "Calmframe developers")
-set(CPACK_PACKAGE_CONTACT "Calmframe developers <calmframe@localhost>")
+set(CPACK_PACKAGE_CONTACT "Calmframe developers <developers@calmframe.example>")
 set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "${PROJECT_DESCRIPTION}")
 set(CPACK_DEBIAN_PACKAGE_DESCRIPTION
   "Tracks features through a clip, smooths the camera's motion, and draws every\n\

@@ -6,15 +6,11 @@
 
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
+#include "apps/calmframe/stabilize_command.h"
 #include "apps/calmframe/steady_clip.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
-namespace {
-
-constexpr std::int32_t kAutoScaleGroup = 17;  // disk id; its name tells the scale
-
-}  // namespace
 
 AnalyzeCommand::AnalyzeCommand(CLI::App& program)
     : command_(program.add_subcommand(
@@ -40,8 +36,11 @@ void AnalyzeCommand::Run() {
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
   const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
-  const std::unique_ptr<CropWindow> crop = clip.Crop();
+  if (const CropTrouble trouble = CropTroubleOf(clip); !trouble.line.empty()) {
+    progress.Warn(trouble.line);
+  }
   if (run_.json) {
+    const std::unique_ptr<CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;
     json["clip"] = input_;
     json["width"] = info.width;
@@ -51,15 +50,12 @@ void AnalyzeCommand::Run() {
       json["crop_width"] = crop->width;
       json["crop_height"] = crop->height;
     }
-    std::printf("%s\n", json.dump().c_str());
+    std::printf("%s\n", JsonLine(json).c_str());
     return unsaved.Throw();
   }
-  std::printf("%s: %zu frames of %dx%d\n", input_.c_str(), info.frame_count, info.width,
-              info.height);
-  if (crop) {
-    std::printf("crop window %dx%d, %s\n", crop->width, crop->height,
-                clip.NameOf(kAutoScaleGroup).c_str());
-  }
+  std::printf("%s: %zu %s of %dx%d\n", input_.c_str(), info.frame_count,
+              info.frame_count == 1 ? "frame" : "frames", info.width, info.height);
+  if (const std::string text = clip.CropText(); !text.empty()) std::printf("%s\n", text.c_str());
   unsaved.Throw();
 }
 

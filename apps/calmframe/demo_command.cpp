@@ -132,7 +132,7 @@ DemoCommand::DemoCommand(CLI::App& program)
 void DemoCommand::Run() {
   ProgressLine progress(run_.progress_form());
   std::error_code error;
-  std::filesystem::create_directories(directory_, error);
+  const bool made = std::filesystem::create_directories(directory_, error);
   if (error) {
     throw media::Failure(media::Failure::Side::output, directory_ + ": " + error.message());
   }
@@ -143,9 +143,14 @@ void DemoCommand::Run() {
   OutputFlags flags = flags_;
   flags.encode = Encoding(flags_.encode);
 
-  WriteSample(shaky, frames_, flags.encode, run_.threads, progress);
-  Stabilize(shaky, steady, "", controls_, flags, run_.threads, progress);
-  WriteSideBySide(shaky, steady, both, flags.encode, progress);
+  try {
+    WriteSample(shaky, frames_, flags.encode, run_.threads, progress);
+    Stabilize(shaky, steady, "", controls_, flags, run_.threads, progress);
+    WriteSideBySide(shaky, steady, both, flags.encode, progress);
+  } catch (...) {
+    if (made) std::filesystem::remove(directory_, error);  // where nothing is in it
+    throw;
+  }
   if (run_.progress_form() == ProgressLine::Form::line) {
     std::fprintf(stderr, "wrote %s, %s and %s\n", shaky.c_str(), steady.c_str(), both.c_str());
   }

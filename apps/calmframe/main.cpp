@@ -1,9 +1,11 @@
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <cctype>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <exception>
+#include <filesystem>
 #include <functional>
 #include <new>
 #include <nlohmann/json.hpp>
@@ -46,10 +48,18 @@ std::string UnknownWord(const CLI::App& program, int argc, char** argv) {
       for (const std::string& name : option->get_lnames()) flags.push_back("--" + name);
     }
   }
-  if (!chosen) return "unknown command " + first + NearestHint(first, names);
+  if (!chosen) {
+    if (first.rfind('-', 0) == 0) return "the command comes first, then its flags";
+    std::error_code ignored;
+    if (std::filesystem::exists(first, ignored)) {
+      return first + " is no command; to steady a clip: calmframe stabilize IN OUT";
+    }
+    return "unknown command " + first + NearestHint(first, names);
+  }
   for (int i = 2; i < argc; ++i) {
     const std::string word = std::string(argv[i]).substr(0, std::string(argv[i]).find('='));
-    if (word.rfind("--", 0) != 0 || std::find(flags.begin(), flags.end(), word) != flags.end()) {
+    const bool flag = word.size() > 1 && word[0] == '-' && !std::isdigit(word[1]);
+    if (!flag || word == "-h" || std::find(flags.begin(), flags.end(), word) != flags.end()) {
       continue;
     }
     return "unknown flag " + word + NearestHint(word, flags);
@@ -60,8 +70,7 @@ std::string UnknownWord(const CLI::App& program, int argc, char** argv) {
 int Fail(ExitCode code, const std::string& line, bool json = false) {
   if (json) {
     const nlohmann::ordered_json object = {{"error", line}, {"exit_code", code}};
-    std::fprintf(stderr, "%s\n",
-                 object.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace).c_str());
+    std::fprintf(stderr, "%s\n", JsonLine(object).c_str());
   } else {
     std::fprintf(stderr, "calmframe: %s\n", line.c_str());
   }
@@ -154,7 +163,11 @@ int Run(int argc, char** argv) {
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;
-    if (argc > 2) argv[2] = help_flag;
+    if (argc > 2) {
+      argv[2] = help_flag;
+      const std::string unknown = UnknownWord(program, argc, argv);
+      if (!unknown.empty()) return Fail(kUsage, unknown + " (calmframe --help tells more)");
+    }
   }
   try {
     program.parse(argc, argv);
@@ -183,7 +196,7 @@ int Run(int argc, char** argv) {
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);
   } catch (const Interrupted&) {
-    return Fail(kInterrupted, "interrupted; nothing was written", json);
+    return Fail(kInterrupted, "interrupted; no output was left behind", json);
   } catch (const media::Failure& failure) {
     return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what(),
                 json);

@@ -6,7 +6,6 @@
 #include <cmath>
 #include <csignal>
 #include <cstdio>
-#include <nlohmann/json.hpp>
 
 namespace calmframe {
 namespace {
@@ -43,6 +42,10 @@ void CatchInterrupts() {
 
 bool InterruptAsked() {
   return interrupt_asked != 0;
+}
+
+std::string JsonLine(const nlohmann::ordered_json& json) {
+  return json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
 }
 
 std::string ProgressText(const Progress& progress, double elapsed_seconds) {
@@ -84,7 +87,7 @@ std::string ProgressJson(const Progress& progress, double elapsed_seconds) {
   if (!progress.says.empty()) json["says"] = progress.says;
   if (progress.ends) json["ended"] = true;
   json["elapsed"] = std::round(elapsed_seconds * 1000) / 1000;
-  return json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
+  return JsonLine(json);
 }
 
 ProgressLine::ProgressLine(Form form) : form_(form), terminal_(isatty(STDERR_FILENO) != 0) {}
@@ -126,9 +129,7 @@ void ProgressLine::Tell(const char* key, const std::string& line) {
   if (line_open_) std::fputc('\n', stderr);
   line_open_ = false;
   if (form_ == Form::json) {
-    const nlohmann::json json = {{key, line}};
-    std::fprintf(stderr, "%s\n",
-                 json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace).c_str());
+    std::fprintf(stderr, "%s\n", JsonLine({{key, line}}).c_str());
   } else {
     std::fprintf(stderr, "calmframe: %s\n", line.c_str());
   }

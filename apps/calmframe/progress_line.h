@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <nlohmann/json.hpp>
 #include <string>
 
 namespace calmframe {
@@ -41,6 +42,9 @@ class ProgressLine {
   std::chrono::steady_clock::time_point last_shown_;
   bool line_open_ = false;
 };
+
+// An object as a line for programs. A file's name may be no UTF-8; then what isn't is replaced.
+std::string JsonLine(const nlohmann::ordered_json& json);
 
 // One line of a stage, without a newline: "rendering   42 %  126/300 frames  18.3 frames/s  0:09
 // left". What the effect says takes the place of the numbers that it tells.

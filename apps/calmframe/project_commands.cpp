@@ -1,7 +1,6 @@
 #include "apps/calmframe/project_commands.h"
 
 #include <cstdio>
-#include <filesystem>
 #include <limits>
 #include <memory>
 #include <nlohmann/json.hpp>
@@ -12,6 +11,7 @@
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/steady_clip.h"
 #include "apps/calmframe/track_export.h"
+#include "host/media/output_file.h"
 #include "host/project/project_file.h"
 #include "platform/tessel/threads.h"
 
@@ -64,7 +64,7 @@ void RenderCommand::Run() {
   const media::ClipInfo& info = clip->info();
   const FrameRange range{from_, to_ == 0 ? info.frame_count : to_};
   if (range.first >= range.end || range.end > info.frame_count) {
-    throw UsageFailure("--from and --to must lie within the clip's " +
+    throw UsageFailure("--from must be below --to, and both within the clip's " +
                        std::to_string(info.frame_count) + " frames");
   }
   KeepApart(output_, {project_, clip->path()});
@@ -109,7 +109,7 @@ void InfoCommand::Run() {
     json["frames"] = project.length;
     json["rate"] = rate;
     json["instance_bytes"] = project.effect.instance.size();
-    std::printf("%s\n", json.dump().c_str());
+    std::printf("%s\n", JsonLine(json).c_str());
     return;
   }
   std::printf("%s: %d frames of %dx%d from %d, %.6g a second, %zu bytes of results\n",
@@ -123,20 +123,20 @@ TracksCommand::TracksCommand(CLI::App& program)
     : command_(program.add_subcommand("tracks", "Write the tracks of saved work to a file")) {
   AddFile(*command_, "PROJECT", project_, "The saved work")->required();
   AddFile(*command_, "OUT", output_, "The track file, .trk")->required();
+  command_->add_flag("--overwrite", overwrite_, "Replace OUT where it exists");
   command_->footer(
       "Examples:\n"
       "  calmframe tracks shaky.calm shaky.trk");
 }
 
 void TracksCommand::Run() {
+  media::OutputFile file(output_, project_, overwrite_);
   ControlFlags controls;
   controls.experimental = true;  // the button is one for experts
   const std::unique_ptr<SteadyClip> clip = OpenSaved(project_, controls);
-  std::error_code error;
-  if (std::filesystem::exists(output_, error)) {
-    throw media::Failure(media::Failure::Side::output, output_ + ": exists already");
-  }
-  SaveTracks(*clip, project_, output_);
+  KeepApart(output_, {clip->path()});
+  SaveTracks(*clip, project_, file.temporary());
+  file.Commit();
 }
 
 }  // namespace calmframe

@@ -47,6 +47,7 @@ class TracksCommand {
  private:
   CLI::App* const command_;
   std::string project_, output_;
+  bool overwrite_ = false;
 };
 
 }  // namespace calmframe

@@ -14,7 +14,6 @@
 #include <vector>
 
 #include "apps/calmframe/failures.h"
-#include "host/effects/param_table.h"
 #include "host/effects/renderer.h"
 
 namespace calmframe {
@@ -149,13 +148,9 @@ void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer
 double NeighboursOf(SteadyClip& clip) {
   constexpr std::int32_t kFraming = 22, kSynthesisInputRange = 38;  // disk ids
   constexpr double kSynthesizeEdges = 4;
-  const auto value = [&clip](std::int32_t disk_id) {
-    const auto param = clip.effect().Param(clip.effect().IndexOf(disk_id));
-    return param ? host::ValueOf(*param).value_or(0.0) : 0.0;
-  };
   const media::Ratio rate = clip.info().frame_rate;
-  return value(kFraming) == kSynthesizeEdges
-             ? std::round(value(kSynthesisInputRange) * static_cast<double>(rate.num) /
+  return clip.ValueOf(kFraming) == kSynthesizeEdges
+             ? std::round(clip.ValueOf(kSynthesisInputRange) * static_cast<double>(rate.num) /
                           static_cast<double>(rate.den))
              : 0.0;
 }

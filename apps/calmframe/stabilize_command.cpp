@@ -1,6 +1,9 @@
 #include "apps/calmframe/stabilize_command.h"
 
+#include <algorithm>
+#include <cmath>
 #include <memory>
+#include <string>
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
@@ -9,25 +12,56 @@
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
-void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
-  const std::unique_ptr<CropWindow> crop = clip.Crop();
-  if (!crop) return;
-  if (crop->width <= 0 || crop->height <= 0) {
-    throw SolveFailure(clip.path() +
-                       ": no part of the picture stays in view; set --framing stabilize-only or "
-                       "adjust other flags");
+namespace {
+
+// The share of the picture that stays black because the controls stop its enlargement, 0 to 1.
+double BlackShare(const SteadyClip& clip, double width, const CropWindow& crop) {
+  constexpr std::int32_t kSafeMargin = 3, kMaximumScale = 4, kAdditionalScale = 16, kFraming = 22;
+  constexpr double kAutoScale = 3;
+  // Whoever asks for a border or a smaller picture has one.
+  if (clip.ValueOf(kFraming) != kAutoScale || clip.ValueOf(kSafeMargin) > 0 ||
+      clip.ValueOf(kAdditionalScale) < 100) {
+    return 0;
   }
-  constexpr double kSmall = 0.4;  // of a side
+  const double most = clip.ValueOf(kMaximumScale) / 100 * clip.ValueOf(kAdditionalScale) / 100;
+  return 1 - std::min(1.0, most * crop.width / width) *
+                 std::min(1.0, most * crop.height / clip.info().height);
+}
+
+}  // namespace
+
+CropTrouble CropTroubleOf(SteadyClip& clip) {
+  const std::unique_ptr<CropWindow> crop = clip.Crop();
+  if (!crop) return {};
+  if (crop->width <= 0 || crop->height <= 0) {
+    return {
+        "no part of the picture stays in view; set --framing stabilize-only or adjust other flags",
+        true};
+  }
   const media::ClipInfo& info = clip.info();
   const double width = static_cast<double>(info.width) *
                        static_cast<double>(info.pixel_aspect.num) /
                        static_cast<double>(info.pixel_aspect.den);
-  if (crop->width < kSmall * width || crop->height < kSmall * info.height) {
-    progress.Warn("of " + std::to_string(info.width) + "x" + std::to_string(info.height) +
-                  " pixels only " + std::to_string(crop->width) + "x" +
-                  std::to_string(crop->height) +
-                  " stay in view; less --smoothness or --framing stabilize-only keeps more");
+  const std::string window = std::to_string(crop->width) + "x" + std::to_string(crop->height);
+  constexpr double kBlack = 0.02;  // of the picture; less is a line at its edge
+  if (const double black = BlackShare(clip, width, *crop); black > kBlack) {
+    const double needed = std::max(width / crop->width, double(info.height) / crop->height);
+    return {std::to_string(std::lround(100 * black)) +
+            " % of the picture stays black: the crop window is " + window +
+            " and would fill it at --maximum-scale " +
+            std::to_string(static_cast<int>(std::ceil(100 * needed))) +
+            "; less --smoothness crops less"};
   }
+  constexpr double kSmall = 0.4;  // of a side
+  if (crop->width >= kSmall * width && crop->height >= kSmall * info.height) return {};
+  return {"of " + std::to_string(info.width) + "x" + std::to_string(info.height) + " pixels only " +
+          window + " stay in view; less --smoothness or --framing stabilize-only keeps more"};
+}
+
+void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
+  const CropTrouble trouble = CropTroubleOf(clip);
+  if (trouble.nothing_seen) throw SolveFailure(clip.path() + ": " + trouble.line);
+  if (!trouble.line.empty()) progress.Warn(trouble.line);
 }
 
 namespace {

@@ -37,6 +37,13 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
                const ControlFlags& controls, const OutputFlags& flags, int threads,
                ProgressLine& progress);
 
+// What a user should know of the crop: that much is lost, or all. No line where all is well.
+struct CropTrouble {
+  std::string line;
+  bool nothing_seen = false;
+};
+CropTrouble CropTroubleOf(SteadyClip& clip);
+
 // Refuses a clip of which nothing would be seen, and tells of one that loses much.
 void CheckCrop(SteadyClip& clip, ProgressLine& progress);
 

@@ -2,10 +2,12 @@
 
 #include <malloc.h>
 
+#include <algorithm>
 #include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstdio>
-#include <optional>
+#include <cstring>
+#include <numeric>
 #include <utility>
 
 #include "apps/calmframe/failures.h"
@@ -19,6 +21,7 @@ namespace {
 constexpr std::int32_t kAnalyzeButton = 1;
 constexpr std::int32_t kCancelButton = 11;
 constexpr std::int32_t kStabilizationGroup = 12;
+constexpr std::int32_t kAutoScaleGroup = 17;  // its name tells the scale
 constexpr std::int32_t kMethod = 28;
 
 // The effect's words for what its status counter tells when it has ended without a result.
@@ -27,15 +30,15 @@ enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
 // A tracking window of the least size needs that much.
 constexpr int kLeastSide = 20;
 
-std::unique_ptr<media::ClipReader> OpenReader(const std::string& path) {
-  auto reader = media::ClipReader::Open(path);
-  const media::ClipInfo& info = reader->info();
-  if (info.width < kLeastSide || info.height < kLeastSide) {
-    throw media::Failure(media::Failure::Side::input, path + ": " + std::to_string(info.width) +
-                                                          " by " + std::to_string(info.height) +
-                                                          " pixels are too few to stabilize");
+media::FieldOrder OrderOf(std::int32_t field_type) {
+  switch (field_type) {
+    case HX_FIELD_FIRST_ORDER:
+      return media::FieldOrder::top_first;
+    case HX_FIELD_SECOND_ORDER:
+      return media::FieldOrder::bottom_first;
+    default:
+      return media::FieldOrder::progressive;
   }
-  return reader;
 }
 
 host::HostSettings SettingsFor(const media::ClipInfo& info, const ControlFlags& controls) {
@@ -83,20 +86,59 @@ std::string Reuse::Text() const {
                  : "reused the analysis and the solve";
 }
 
+SteadyClip::Medium SteadyClip::Open(const std::string& path) {
+  std::unique_ptr<media::ClipReader> reader = media::ClipReader::Open(path);
+  const media::ClipInfo info = reader->info();
+  if (info.width < kLeastSide || info.height < kLeastSide) {
+    throw media::Failure(media::Failure::Side::input, path + ": " + std::to_string(info.width) +
+                                                          " by " + std::to_string(info.height) +
+                                                          " pixels are too few to stabilize");
+  }
+  return {info, host::OpenClip(std::move(reader))};
+}
+
+SteadyClip::Medium SteadyClip::Blank(const host::Project& project) {
+  host::SourceInfo source;
+  source.width = std::max(project.width, 1);
+  source.height = std::max(project.height, 1);
+  source.pixel_aspect = project.pixel_aspect;
+  source.frame_count = std::int64_t{project.start_frame} + project.length;
+  source.ticks_per_frame = project.ticks_per_frame;
+  source.field_type = project.field_type;
+  source.content = project.clip_content;
+  media::ClipInfo info;
+  info.path = project.clip_path;
+  info.width = source.width;
+  info.height = source.height;
+  info.pixel_aspect = {project.pixel_aspect.num, project.pixel_aspect.den};
+  const std::int64_t divisor = std::gcd(HX_TICKS_PER_SECOND, project.ticks_per_frame);
+  info.frame_rate = {HX_TICKS_PER_SECOND / divisor, project.ticks_per_frame / divisor};
+  info.frame_count = static_cast<std::size_t>(std::max<std::int64_t>(source.frame_count, 0));
+  info.field_order = OrderOf(project.field_type);
+  const auto draw = [](std::int64_t, host::Picture& picture) {
+    std::memset(picture.memory(), 0xff, picture.bytes());
+  };
+  return {info, host::MakeDrawnSource(source, draw), true};
+}
+
 SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls)
-    : SteadyClip(nullptr, OpenReader(path), controls) {}
+    : SteadyClip(nullptr, Open(path), controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const std::string& path,
                        const ControlFlags& controls)
-    : SteadyClip(&project, OpenReader(path), controls) {}
+    : SteadyClip(&project, Open(path), controls) {}
 
-SteadyClip::SteadyClip(const host::Project* project, std::unique_ptr<media::ClipReader> reader,
+SteadyClip::SteadyClip(const host::Project& project, const ControlFlags& controls)
+    : SteadyClip(&project, Blank(project), controls) {}
+
+SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
                        const ControlFlags& controls) try
-    : info_(reader->info()),
+    : info_(medium.info),
+      blank_(medium.blank),
       host_(PluginPath(), SettingsFor(info_, controls)),
       values_(ResolveControls(controls, host_.declarations())),
       session_(host_) {
-  const auto layer = boost::make_shared<host::Layer>(host::OpenClip(std::move(reader)));
+  const auto layer = boost::make_shared<host::Layer>(medium.source);
   layer->Change([&](host::LayerState& state) {
     state.name = state.file_name = path();
     if (!project) return;
@@ -135,6 +177,7 @@ void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
       shown.stage = stage;
       shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
       if (ParseFrames(shown.says, &shown.done, &shown.total)) shown.unit = "frames";
+      if (shown.says.find('(') == std::string::npos) shown.says.clear();  // the bare name
       progress.Show(shown);
     }
     return InterruptAsked();
@@ -154,6 +197,10 @@ Reuse SteadyClip::Work(ProgressLine& progress) {
   const std::int32_t analyze = effect_->IndexOf(kAnalyzeButton);
   if (const auto button = effect_->Param(analyze);
       button && (button->ui_flags & HX_PARAM_UI_DISABLED) == 0) {
+    if (blank_) {
+      throw media::Failure(media::Failure::Side::input,
+                           path() + ": is gone, and what was made of it doesn't stand any more");
+    }
     reuse = {};
     const host::CommandResult pressed = effect_->Press(analyze);
     if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
@@ -173,20 +220,18 @@ void SteadyClip::CheckResult(ProgressLine& progress) {
   for (const std::string& message : messages) progress.Warn(message);
 }
 
-bool SteadyClip::SolveAnew(ProgressLine& progress) {
+void SteadyClip::SolveAnew(ProgressLine& progress) {
   const std::int32_t method = effect_->IndexOf(kMethod);
-  const auto param = effect_->Param(method);
-  const std::optional<double> value = param ? host::ValueOf(*param) : std::nullopt;
-  if (!value) return false;
-  // A method that is quick to solve for; with the first one again, nothing of it stands.
-  Reuse reuse{true, true, true};
-  for (const double other : {*value == 1 ? 2.0 : 1.0, *value}) {
-    effect_->SetParam(method, other);
-    reuse = {true, true, true};
-    Settle(progress, reuse);
-    CheckResult(progress);
-  }
-  return !reuse.framing;
+  const double value = ValueOf(kMethod);
+  // A method that is quick to solve for, without a word; with the first one again, nothing of it
+  // stands.
+  ProgressLine nothing(ProgressLine::Form::none);
+  Reuse ignored;
+  effect_->SetParam(method, value == 1 ? 2.0 : 1.0);
+  Settle(nothing, ignored);
+  effect_->SetParam(method, value);
+  Settle(progress, ignored);
+  CheckResult(progress);
 }
 
 host::Project SteadyClip::Saved() {
@@ -198,6 +243,7 @@ host::Project SteadyClip::Saved() {
   project.clip_content = layer->source->info().content;
   project.width = info_.width;
   project.height = info_.height;
+  project.pixel_aspect = layer->source->info().pixel_aspect;
   project.start_frame = layer->start_frame;
   project.length = layer->length;
   project.ticks_per_frame = layer->ticks_per_frame;
@@ -235,9 +281,21 @@ std::unique_ptr<CropWindow> SteadyClip::Crop() {
   return std::make_unique<CropWindow>(CropWindow{width, height});
 }
 
+std::string SteadyClip::CropText() {
+  const std::unique_ptr<CropWindow> crop = Crop();
+  if (!crop) return "";
+  return "crop window " + std::to_string(crop->width) + "x" + std::to_string(crop->height) + ", " +
+         NameOf(kAutoScaleGroup);
+}
+
 std::string SteadyClip::NameOf(std::int32_t disk_id) const {
   const auto param = effect_->Param(effect_->IndexOf(disk_id));
   return param ? param->name : "";
+}
+
+double SteadyClip::ValueOf(std::int32_t disk_id) const {
+  const auto param = effect_->Param(effect_->IndexOf(disk_id));
+  return param ? host::ValueOf(*param).value_or(0.0) : 0.0;
 }
 
 void SteadyClip::CheckMedia() {

@@ -11,6 +11,7 @@
 #include "host/effects/session.h"
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
+#include "host/timeline/source.h"
 
 namespace calmframe {
 
@@ -34,6 +35,8 @@ class SteadyClip {
   // say so. Throws media::Failure, UsageFailure, and SolveFailure when the effect can't be had.
   SteadyClip(const std::string& path, const ControlFlags& controls);
   SteadyClip(const host::Project& project, const std::string& path, const ControlFlags& controls);
+  // The saved work of a clip that is gone: what was made of it stands, its frames are blank.
+  SteadyClip(const host::Project& project, const ControlFlags& controls);
 
   const std::string& path() const { return info_.path; }
   const media::ClipInfo& info() const { return info_; }
@@ -42,27 +45,38 @@ class SteadyClip {
   host::Effect& effect() { return *effect_; }
 
   // Waits until the effect has analysed and solved the clip, as far as that is to do. Throws
-  // Interrupted, SolveFailure, media::Failure.
+  // Interrupted, SolveFailure, media::Failure; the last also where a clip that is gone would have
+  // to be analysed.
   Reuse Work(ProgressLine& progress);
 
-  // Solves once more with the controls as they stand, for what only a running solve tells; false
-  // where nothing began to solve. Throws as Work.
-  bool SolveAnew(ProgressLine& progress);
+  // Solves once more with the controls as they stand, for what only a running solve tells. Throws
+  // as Work.
+  void SolveAnew(ProgressLine& progress);
 
   // Throws SolveFailure where the effect can't be saved.
   host::Project Saved();
 
   // After Work. Null where the framing has none.
   std::unique_ptr<CropWindow> Crop();
+  // "crop window 575x298, Auto-scale (121.1%)"; empty where the framing has none.
+  std::string CropText();
   // The name of a parameter as the effect has it now, of a group with its readout.
   std::string NameOf(std::int32_t disk_id) const;
+  // The value of a parameter as the effect has it now; 0 of one without.
+  double ValueOf(std::int32_t disk_id) const;
 
   // Throws media::Failure when the clip could not be read to its end.
   void CheckMedia();
 
  private:
-  SteadyClip(const host::Project* project, std::unique_ptr<media::ClipReader> reader,
-             const ControlFlags& controls);
+  struct Medium {
+    media::ClipInfo info;
+    host::SourcePtr source;
+    bool blank = false;  // a stand-in for one that is gone
+  };
+  static Medium Open(const std::string& path);
+  static Medium Blank(const host::Project& project);
+  SteadyClip(const host::Project* project, const Medium& medium, const ControlFlags& controls);
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`.
   void Settle(ProgressLine& progress, Reuse& reuse);
   // Throws SolveFailure where the effect is not ready.
@@ -71,6 +85,7 @@ class SteadyClip {
   const void* FirstWarp();
 
   const media::ClipInfo info_;
+  const bool blank_;
   host::Host host_;
   const std::map<std::int32_t, double> values_;
   host::Session session_;

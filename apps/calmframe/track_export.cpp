@@ -21,10 +21,8 @@ void SaveTracks(SteadyClip& clip, const std::string& shown, const std::string& p
   tesselui::InstallSaveDialog({});
   if (!pressed.ok()) throw SolveFailure(pressed.Line(path));
   std::error_code error;
-  if (!std::filesystem::exists(path, error)) {
-    throw media::Failure(media::Failure::Side::output,
-                         path + ": not written; " + shown + " may hold no tracks");
-  }
+  const std::uintmax_t bytes = std::filesystem::file_size(path, error);
+  if (error || bytes == 0) throw SolveFailure(shown + ": holds no tracks");
 }
 
 }  // namespace calmframe

@@ -16,13 +16,14 @@ constexpr char kHead[] = R"html(<meta name="viewport" content="width=device-widt
 body { margin: 0 auto; max-width: 1080px; padding: 24px 20px 60px; background: var(--back); color: var(--ink); font: 15px/1.5 system-ui, "Segoe UI", "Noto Sans", "DejaVu Sans", sans-serif; }
 h1 { font-size: 26px; line-height: 1.25; margin: 8px 0 2px; overflow-wrap: anywhere; }
 h2 { font-size: 17px; margin: 34px 0 10px; }
+h2 + .lead { margin-bottom: 14px; max-width: 75ch; }
 .lead, figcaption p { color: var(--soft); margin: 0; }
 section.cards { display: grid; grid-template-columns: repeat(auto-fit, minmax(min(320px, 100%), 1fr)); gap: 14px; margin-top: 18px; align-items: start; }
 table { width: 100%; border-collapse: collapse; background: var(--card); border: 1px solid var(--line); border-radius: 8px; }
 caption { text-align: left; font-weight: 600; padding: 0 0 6px; }
 th, td { text-align: left; vertical-align: top; padding: 5px 12px; border-top: 1px solid var(--line); overflow-wrap: anywhere; }
 tr:first-child > * { border-top: 0; }
-th { font-weight: 400; color: var(--soft); width: 46%; }
+th { font-weight: 400; color: var(--soft); width: 1%; white-space: nowrap; }
 td { font-variant-numeric: tabular-nums; }
 .notes { background: var(--card); border: 1px solid var(--line); border-left: 4px solid var(--c0); border-radius: 6px; padding: 8px 14px; margin: 18px 0 0; list-style: none; }
 figure { margin: 0 0 16px; background: var(--card); border: 1px solid var(--line); border-radius: 8px; padding: 12px 14px 8px; break-inside: avoid; }
@@ -45,11 +46,13 @@ svg .alone { stroke-dasharray: none; stroke: var(--c1); stroke-width: 1.8; }
 svg .cursor { stroke: var(--soft); display: none; }
 .film { display: grid; grid-template-columns: repeat(auto-fill, minmax(min(300px, 46%), 1fr)); gap: 14px; }
 .film figure { padding: 8px; margin: 0; }
-.film img { display: block; width: 100%; height: auto; border-radius: 4px; background: #000; margin-top: 4px; }
+.film div { position: relative; margin-top: 4px; }
+.film img { display: block; width: 100%; height: auto; border-radius: 4px; background: #000; }
+.film span { position: absolute; left: 6px; bottom: 6px; padding: 0 7px; border-radius: 9px; background: rgb(0 0 0 / 60%); color: #fff; font-size: 12px; line-height: 18px; }
 .film figcaption { margin: 0; color: var(--soft); }
 footer { color: var(--soft); font-size: 13px; margin-top: 40px; }
-@media (max-width: 640px) { svg text { font-size: 19px; } }
-@media print { :root { color-scheme: light; --back: #fff; } body { max-width: none; padding: 0; } }
+@media (max-width: 640px) { svg.plot { overflow: visible; margin-bottom: 6px; } svg text { font-size: 23px; } svg .x { transform: translateY(9px); } }
+@media print { :root { color-scheme: light; --back: #fff; } body { max-width: none; padding: 0; } h2 { break-after: avoid; } section.cards { break-inside: avoid; } }
 </style>
 )html";
 
@@ -99,7 +102,8 @@ std::string TableOf(const std::string& caption, const std::vector<Fact>& facts) 
 
 // A curve that stands alone has the second one's colour and no key.
 std::string FigureOf(const Plot& plot, double seconds_a_value) {
-  std::string html = "<figure><figcaption><b>" + Escaped(plot.title) + "</b>";
+  std::string html = "<figure><figcaption><b>" + Escaped(plot.title) +
+                     (plot.unit.empty() ? "" : ", " + Escaped(plot.unit)) + "</b>";
   const bool alone = plot.curves.size() == 1;
   for (std::size_t c = 0; c < plot.curves.size(); ++c) {
     html += "<span class=\"key k" + std::to_string(alone ? 1 : c) + "\"><i></i>" +
@@ -107,6 +111,13 @@ std::string FigureOf(const Plot& plot, double seconds_a_value) {
   }
   html += "<p>" + Escaped(plot.about) + "</p></figcaption>\n";
   return html + SvgOf(plot, seconds_a_value) + "</figure>\n";
+}
+
+// With its name on it.
+std::string PictureOf(const std::string& url, const std::string& name, const std::string& when) {
+  if (url.empty()) return "";
+  return "<div><img alt=\"" + when + " " + name + "\" src=\"" + url + "\"><span>" + name +
+         "</span></div>";
 }
 
 double Rounded(double value) {
@@ -146,7 +157,8 @@ std::string HtmlOf(const Page& page) {
   std::string html =
       "<!DOCTYPE html>\n<html lang=\"en\">\n<head>\n<meta charset=\"utf-8\">\n<title>" +
       Escaped(page.title) + ", steadied</title>\n" + kHead + "</head>\n<body>\n<h1>" +
-      Escaped(page.title) + "</h1>\n<p class=\"lead\">What Calmframe made of it</p>\n";
+      Escaped(page.title) + "</h1>\n";
+  if (!page.lead.empty()) html += "<p class=\"lead\">" + Escaped(page.lead) + "</p>\n";
   if (!page.notes.empty()) {
     html += "<ul class=\"notes\">\n";
     for (const std::string& note : page.notes) html += "<li>" + Escaped(note) + "</li>\n";
@@ -158,18 +170,16 @@ std::string HtmlOf(const Page& page) {
     html += "<h2>Before and after</h2>\n<section class=\"film\">\n";
     for (const FilmFrame& moment : page.film) {
       const std::string when = "frame " + std::to_string(moment.frame);
-      html += "<figure><figcaption>" + when + ", " + Short(moment.seconds, 2) + " s</figcaption>";
-      if (!moment.before.empty()) {
-        html += "<img alt=\"" + when + " before\" src=\"" + moment.before + "\">";
-      }
-      if (!moment.after.empty()) {
-        html += "<img alt=\"" + when + " after\" src=\"" + moment.after + "\">";
-      }
+      html += "<figure><figcaption>" + when + ", " + Short(moment.seconds, 2) + " s</figcaption>" +
+              PictureOf(moment.before, "as shot", when) + PictureOf(moment.after, "steadied", when);
       html += "</figure>\n";
     }
     html += "</section>\n";
   }
-  if (!page.plots.empty()) html += "<h2>Over time <output id=\"moment\"></output></h2>\n";
+  if (!page.plots.empty()) {
+    html += "<h2>Over time <output id=\"moment\"></output></h2>\n<p class=\"lead\">" +
+            Escaped(page.plots_about) + "</p>\n";
+  }
   for (const Plot& plot : page.plots) html += FigureOf(plot, page.seconds_a_value);
   html += "<script type=\"application/json\" id=\"data\">" + DataOf(page) + "</script>\n";
   if (!page.plots.empty()) html += kScript;

@@ -21,9 +21,11 @@ struct FilmFrame {
 
 struct Page {
   std::string title;               // the clip's name
+  std::string lead;                // the result in one line
   std::vector<Fact> facts;         // of the clip and what became of it
   std::vector<Fact> controls;      // that it was made with
   std::vector<std::string> notes;  // what the reader should know, a sentence each
+  std::string plots_about;         // what holds for several of the plots
   std::vector<Plot> plots;
   double seconds_a_value = 1;  // of all curves
   std::vector<FilmFrame> film;

@@ -1,8 +1,7 @@
 #include "apps/report/picture.h"
 
-#include <cairo.h>
-
 extern "C" {
+#include <libavcodec/avcodec.h>
 #include <libavutil/base64.h>
 }
 
@@ -12,15 +11,24 @@ extern "C" {
 #include <cstdint>
 #include <memory>
 #include <new>
+#include <stdexcept>
 #include <vector>
 
 namespace calmframe::report {
 namespace {
 
-struct DestroySurface {
-  void operator()(cairo_surface_t* surface) const { cairo_surface_destroy(surface); }
+// Quantizer of the encoder, 1 (best) to 31: about 85 on the scale that other programs have.
+constexpr int kQuantizer = 3;
+
+struct FreeContext {
+  void operator()(AVCodecContext* context) const { avcodec_free_context(&context); }
 };
-using SurfacePtr = std::unique_ptr<cairo_surface_t, DestroySurface>;
+struct FreeFrame {
+  void operator()(AVFrame* frame) const { av_frame_free(&frame); }
+};
+struct FreePacket {
+  void operator()(AVPacket* packet) const { av_packet_free(&packet); }
+};
 
 // Ends of the source pixels under each of `count` output pixels, at least one each.
 std::vector<int> Ends(int size, int count) {
@@ -32,32 +40,42 @@ std::vector<int> Ends(int size, int count) {
   return ends;
 }
 
-// Premultiplied, as cairo has it.
-std::uint32_t MeanOf(const PictureView& picture, int left, int right, int top, int bottom) {
-  std::array<std::uint64_t, 4> sums{};  // alpha; the others times alpha
+using Colour = std::array<double, 3>;  // red, green, blue; 0 to 255
+
+Colour MeanOf(const PictureView& picture, int left, int right, int top, int bottom) {
+  std::array<std::uint64_t, 3> sums{};  // times alpha
   for (int y = top; y < bottom; ++y) {
     const auto* row = reinterpret_cast<const HX_Pixel8*>(
         reinterpret_cast<const std::uint8_t*>(picture.pixels) + y * picture.row_bytes);
     for (int x = left; x < right; ++x) {
       const std::uint32_t alpha = row[x].alpha;
-      sums[0] += alpha;
-      sums[1] += alpha * row[x].red;
-      sums[2] += alpha * row[x].green;
-      sums[3] += alpha * row[x].blue;
+      sums[0] += alpha * row[x].red;
+      sums[1] += alpha * row[x].green;
+      sums[2] += alpha * row[x].blue;
     }
   }
-  const auto count =
-      static_cast<std::uint64_t>(right - left) * static_cast<std::uint64_t>(bottom - top);
-  const auto mean = [&](std::size_t channel, std::uint64_t unit) {
-    return static_cast<std::uint32_t>((sums[channel] + count * unit / 2) / (count * unit));
-  };
-  return mean(0, 1) << 24 | mean(1, 255) << 16 | mean(2, 255) << 8 | mean(3, 255);
+  const double unit = 255.0 * (right - left) * (bottom - top);
+  return {static_cast<double>(sums[0]) / unit, static_cast<double>(sums[1]) / unit,
+          static_cast<double>(sums[2]) / unit};
 }
 
-cairo_status_t Append(void* bytes, const unsigned char* data, unsigned length) {
-  auto& to = *static_cast<std::vector<unsigned char>*>(bytes);
-  to.insert(to.end(), data, data + length);
-  return CAIRO_STATUS_SUCCESS;
+// As JFIF has it: BT.601 in full range.
+std::array<std::uint8_t, 3> YCbCrOf(const Colour& colour) {
+  const auto [red, green, blue] = colour;
+  const double luma = 0.299 * red + 0.587 * green + 0.114 * blue;
+  const auto byte = [](double value) {
+    return static_cast<std::uint8_t>(std::clamp(std::lround(value), 0L, 255L));
+  };
+  return {byte(luma), byte(128 + (blue - luma) / 1.772), byte(128 + (red - luma) / 1.402)};
+}
+
+std::string Base64Of(const AVPacket& packet) {
+  std::string text(AV_BASE64_SIZE(static_cast<std::size_t>(packet.size)), '\0');
+  if (!av_base64_encode(text.data(), static_cast<int>(text.size()), packet.data, packet.size)) {
+    throw std::bad_alloc();
+  }
+  text.pop_back();  // the terminating zero
+  return text;
 }
 
 }  // namespace
@@ -66,37 +84,45 @@ std::string DataUrlOf(const PictureView& picture, int width) {
   width = std::clamp(width, 1, picture.width);
   const double shape = picture.width * picture.pixel_aspect / picture.height;
   const int height = std::clamp(static_cast<int>(std::lround(width / shape)), 1, picture.height);
-  const SurfacePtr surface(cairo_image_surface_create(CAIRO_FORMAT_ARGB32, width, height));
-  if (cairo_surface_status(surface.get()) != CAIRO_STATUS_SUCCESS) throw std::bad_alloc();
+
+  const AVCodec* codec = avcodec_find_encoder(AV_CODEC_ID_MJPEG);
+  if (!codec) throw std::runtime_error("FFmpeg has no JPEG encoder");
+  const std::unique_ptr<AVCodecContext, FreeContext> context(avcodec_alloc_context3(codec));
+  const std::unique_ptr<AVFrame, FreeFrame> frame(av_frame_alloc());
+  const std::unique_ptr<AVPacket, FreePacket> packet(av_packet_alloc());
+  if (!context || !frame || !packet) throw std::bad_alloc();
+  context->width = frame->width = width;
+  context->height = frame->height = height;
+  context->pix_fmt = AV_PIX_FMT_YUVJ444P;
+  frame->format = AV_PIX_FMT_YUVJ444P;
+  context->time_base = {1, 25};
+  context->flags |= AV_CODEC_FLAG_QSCALE;
+  context->global_quality = frame->quality = FF_QP2LAMBDA * kQuantizer;
+  if (avcodec_open2(context.get(), codec, nullptr) < 0 || av_frame_get_buffer(frame.get(), 0) < 0) {
+    throw std::bad_alloc();
+  }
+
   const std::vector<int> columns = Ends(picture.width, width);
   const std::vector<int> rows = Ends(picture.height, height);
-  cairo_surface_flush(surface.get());
-  unsigned char* data = cairo_image_surface_get_data(surface.get());
-  const int stride = cairo_image_surface_get_stride(surface.get());
   int top = 0;
   for (int y = 0; y < height; ++y) {
     const int bottom = rows[static_cast<std::size_t>(y)];
-    auto* out = reinterpret_cast<std::uint32_t*>(data + std::ptrdiff_t{y} * stride);
     int left = 0;
     for (int x = 0; x < width; ++x) {
       const int right = columns[static_cast<std::size_t>(x)];
-      out[x] = MeanOf(picture, left, right, top, bottom);
+      const auto parts = YCbCrOf(MeanOf(picture, left, right, top, bottom));
+      for (std::size_t plane = 0; plane < parts.size(); ++plane) {
+        frame->data[plane][std::ptrdiff_t{y} * frame->linesize[plane] + x] = parts[plane];
+      }
       left = right;
     }
     top = bottom;
   }
-  cairo_surface_mark_dirty(surface.get());
-  std::vector<unsigned char> png;
-  if (cairo_surface_write_to_png_stream(surface.get(), Append, &png) != CAIRO_STATUS_SUCCESS) {
+  if (avcodec_send_frame(context.get(), frame.get()) < 0 ||
+      avcodec_receive_packet(context.get(), packet.get()) < 0) {
     throw std::bad_alloc();
   }
-  std::string text(AV_BASE64_SIZE(png.size()), '\0');
-  if (!av_base64_encode(text.data(), static_cast<int>(text.size()), png.data(),
-                        static_cast<int>(png.size()))) {
-    throw std::bad_alloc();
-  }
-  text.pop_back();  // the terminating zero
-  return "data:image/png;base64," + text;
+  return "data:image/jpeg;base64," + Base64Of(*packet);
 }
 
 }  // namespace calmframe::report

@@ -15,8 +15,8 @@ struct PictureView {
   double pixel_aspect = 1;
 };
 
-// A PNG of `width` square pixels across, each the mean of what it covers, as a data URL. Throws
-// std::bad_alloc.
+// A JPEG of `width` square pixels across, each the mean of what it covers, over black, as a data
+// URL. Throws std::bad_alloc, and std::runtime_error where FFmpeg has no such encoder.
 std::string DataUrlOf(const PictureView& picture, int width);
 
 }  // namespace calmframe::report

@@ -144,7 +144,7 @@ std::string SvgOf(const Plot& plot, double seconds_a_value) {
                     Coordinate(kWidth) + " " + Coordinate(kHeight) +
                     "\" role=\"img\" data-count=\"" + std::to_string(count) + "\" aria-label=\"" +
                     Escaped(plot.title + ". " + plot.about) + "\">\n";
-  const double y_step = StepOf(range.high - range.low, 4);
+  const double y_step = StepOf(range.high - range.low, 5);
   for (double tick = std::ceil(range.low / y_step) * y_step; tick <= range.high + y_step * 1e-6;
        tick += y_step) {
     const std::string y =
@@ -153,10 +153,6 @@ std::string SvgOf(const Plot& plot, double seconds_a_value) {
            Coordinate(kWidth - kRight) + "\" y1=\"" + y + "\" y2=\"" + y + "\"/><text x=\"" +
            Coordinate(kLeft - 6) + "\" y=\"" + y + "\" class=\"y\">" +
            Short(tick, DigitsOf(y_step)) + "</text>\n";
-  }
-  if (!plot.unit.empty()) {
-    svg += "<text x=\"" + Coordinate(kLeft + 4) + "\" y=\"" + Coordinate(kTop + 4) +
-           "\" class=\"unit\">" + Escaped(plot.unit) + "</text>\n";
   }
   const double t_step = StepOf(seconds, 8);
   for (double tick = 0; tick <= seconds + t_step * 1e-6; tick += t_step) {

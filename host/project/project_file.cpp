@@ -22,16 +22,17 @@ namespace fs = std::filesystem;
 using tessel::utility::Guid;
 
 constexpr std::int64_t kApplicationId = 0x43616c6d;  // "Calm", in the database's header
-constexpr std::int64_t kVersion = 1;
+// 1: the first. 2: the pixels' aspect; it was not told before.
+constexpr std::int64_t kVersion = 2;
 
 constexpr char kChecksum[] = "checksum";
 constexpr char kCreate[] =
     "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
     "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
     "CREATE TABLE instance (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
-    "PRAGMA application_id = 1130458221;"
-    "PRAGMA user_version = 1;";
-static_assert(kApplicationId == 1130458221);
+    "PRAGMA application_id = 1130458221;";
+constexpr char kMarkVersion[] = "PRAGMA user_version = 2";
+static_assert(kApplicationId == 1130458221 && kVersion == 2);
 
 [[noreturn]] void Fail(const std::string& path, const std::string& cause) {
   throw ProjectFailure(path + ": " + cause);
@@ -62,9 +63,10 @@ static_assert(kApplicationId == 1130458221);
   }
 }
 
-// The settings, each with its place in the record. One list serves both ways.
+// The settings that a file of the version has, each with its place in the record. One list serves
+// both ways.
 template <class Record, class Visit>
-void VisitSettings(Record& project, const Visit& visit) {
+void VisitSettings(Record& project, std::int64_t version, const Visit& visit) {
   visit("clip_path", project.clip_path);
   visit("clip_relative", project.clip_relative);
   visit("clip_content", project.clip_content);
@@ -75,15 +77,18 @@ void VisitSettings(Record& project, const Visit& visit) {
   visit("ticks_per_frame", project.ticks_per_frame);
   visit("field_type", project.field_type);
   visit("match_name", project.effect.match_name);
+  if (version < 2) return;
+  visit("pixel_aspect_num", project.pixel_aspect.num);
+  visit("pixel_aspect_den", project.pixel_aspect.den);
 }
 
 // Over all that a project holds. SQLite reads a cut or flipped page as it finds it.
-Guid ChecksumOf(const Project& project) {
+Guid ChecksumOf(const Project& project, std::int64_t version) {
   Guid sum;
   const auto mix = [&](const void* data, std::size_t size) {
     sum = tessel::utility::MixHash(sum, data, size);
   };
-  VisitSettings(project, [&]<class Value>(const char* key, const Value& value) {
+  VisitSettings(project, version, [&]<class Value>(const char* key, const Value& value) {
     mix(key, std::strlen(key));
     if constexpr (std::is_same_v<Value, std::string>) {
       mix(value.data(), value.size());
@@ -133,6 +138,9 @@ struct SettingReader {
   void operator()(const char* key, std::int32_t& value) const {
     Read(key, [&] { value = static_cast<std::int32_t>(select.Integer(0)); });
   }
+  void operator()(const char* key, std::uint32_t& value) const {
+    Read(key, [&] { value = static_cast<std::uint32_t>(select.Integer(0)); });
+  }
   void operator()(const char* key, std::int64_t& value) const {
     Read(key, [&] { value = select.Integer(0); });
   }
@@ -150,8 +158,8 @@ struct SettingReader {
 
 void Write(SqliteDatabase& database, const Project& project) {
   SqliteStatement setting(database, "INSERT INTO setting VALUES (?, ?)");
-  VisitSettings(project, SettingWriter{setting});
-  SettingWriter{setting}(kChecksum, ChecksumOf(project));
+  VisitSettings(project, kVersion, SettingWriter{setting});
+  SettingWriter{setting}(kChecksum, ChecksumOf(project, kVersion));
   SqliteStatement parameter(database, "INSERT INTO parameter VALUES (?, ?)");
   for (const auto& [disk_id, value] : project.effect.values) {
     parameter.Bind(1, std::int64_t{disk_id});
@@ -163,10 +171,11 @@ void Write(SqliteDatabase& database, const Project& project) {
   instance.Step();
 }
 
-void CheckVersion(const std::string& path, SqliteDatabase& database) {
+std::int64_t CheckedVersion(const std::string& path, SqliteDatabase& database) {
   if (database.Number("PRAGMA application_id") != kApplicationId) Fail(path, "is no project");
   const std::int64_t version = database.Number("PRAGMA user_version");
   if (version > kVersion) Fail(path, "was saved by a newer version of the program");
+  return version;
 }
 
 void Sync(const fs::path& place) {
@@ -189,6 +198,7 @@ void Create(const fs::path& path, const Project& project) {
       SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
       database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
       database.Run(kCreate);
+      database.Run(kMarkVersion);
       Write(database, project);
       database.Run("COMMIT");
     }
@@ -204,10 +214,11 @@ void Create(const fs::path& path, const Project& project) {
 
 void Replace(const fs::path& path, const Project& project) {
   SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
-  CheckVersion(path, database);
+  CheckedVersion(path, database);
   database.Run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
   database.Run("DELETE FROM setting; DELETE FROM parameter; DELETE FROM instance");
   Write(database, project);
+  database.Run(kMarkVersion);
   database.Run("COMMIT");
 }
 
@@ -237,10 +248,10 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   if (!fs::exists(path, error)) Fail(path, "is not there");
   // For writing, since an interrupted save is first taken back; SQLite does without where it must.
   SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
-  CheckVersion(path, database);
+  const std::int64_t version = CheckedVersion(path, database);
   Project project;
   SqliteStatement setting(database, "SELECT value FROM setting WHERE key = ?");
-  VisitSettings(project, SettingReader{setting});
+  VisitSettings(project, version, SettingReader{setting});
   SqliteStatement parameter(database, "SELECT disk_id, value FROM parameter");
   while (parameter.Step()) {
     project.effect.values[static_cast<std::int32_t>(parameter.Integer(0))] = parameter.Real(1);
@@ -251,7 +262,8 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   project.effect.instance = instance.Bytes(1);
   Guid checksum;
   SettingReader{setting}(kChecksum, checksum);
-  if (checksum != ChecksumOf(project) || project.ticks_per_frame <= 0) {
+  if (checksum != ChecksumOf(project, version) || project.ticks_per_frame <= 0 ||
+      project.pixel_aspect.num <= 0 || project.pixel_aspect.den == 0) {
     throw SqliteError(SQLITE_CORRUPT, kChecksum);
   }
   return project;

@@ -16,6 +16,7 @@ struct Project {
   std::string clip_relative;           // to the project's folder; empty where there is no such way
   tessel::utility::Guid clip_content;  // ContentOf
   std::int32_t width = 0, height = 0;  // of the clip's frames
+  HX_Ratio pixel_aspect{1, 1};         // width : height of one of their pixels
 
   std::int32_t start_frame = 0, length = 0;  // of the layer; see LayerState
   std::int64_t ticks_per_frame = 0;

@@ -2,26 +2,20 @@
 // stages walked by hand: every pixel of every frame is the same.
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <cstdlib>
-#include <filesystem>
 #include <string>
 #include <vector>
 
 #include "host/media/clip.h"
 #include "pipeline/stabilize.h"
-#include "synthetic/scene.h"
+#include "tests/support/drawn_clip.h"
+#include "tests/support/scratch_folder.h"
 
 namespace {
 
-namespace fs = std::filesystem;
-using calmframe::media::ClipInfo;
 using calmframe::media::ClipReader;
-using calmframe::media::ClipWriter;
 using kelp::effect::Controls;
-
-constexpr int kWidth = 192, kHeight = 128, kFrames = 48;
 
 class Deaf final : public calmframe::pipeline::Listener {
  public:
@@ -46,46 +40,20 @@ Controls With(void (*change)(Controls&)) {
 
 class DirectDriverTest : public testing::TestWithParam<Case> {
  protected:
-  DirectDriverTest() {
-    std::string name = (fs::temp_directory_path() / "calmframe-direct-XXXXXX").string();
-    folder_ = mkdtemp(name.data());
-  }
-  ~DirectDriverTest() override { fs::remove_all(folder_); }
-
-  std::string Path(const std::string& name) const { return folder_ / name; }
-
-  void MakeClip(const std::string& path) const {
-    ClipInfo info;
-    info.width = kWidth;
-    info.height = kHeight;
-    info.frame_rate = {50, 1};
-    info.frame_count = kFrames;
-    calmframe::media::EncodeSettings lossless;
-    lossless.crf = 0;
-    const auto writer = ClipWriter::Create(path, info, kWidth, kHeight, lossless);
-    synthetic::scene_options options;
-    options.width = kWidth;
-    options.height = kHeight;
-    options.frame_count = kFrames;
-    const synthetic::scene scene(synthetic::street(3), synthetic::handheld_path({}), options);
-    std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(kWidth * kHeight));
-    for (int f = 0; f < kFrames; ++f) {
-      scene.render(f, pixels.data(), kWidth);
-      writer->Write(static_cast<std::size_t>(f), pixels.data(), kWidth * 4);
-    }
-    writer->Finish();
-  }
+  std::string Path(const std::string& name) const { return folder_.In(name); }
 
   static void Run(const std::string& command) {
     EXPECT_EQ(std::system(command.c_str()), 0) << command;
   }
 
-  fs::path folder_;
+  const ScratchFolder folder_;
 };
 
 TEST_P(DirectDriverTest, EveryFrameIsTheSame) {
   const Case& c = GetParam();
-  MakeClip(Path("drawn.mkv"));
+  calmframe::media::EncodeSettings lossless;
+  lossless.crf = 0;
+  calmframe::WriteStreet(Path("drawn.mkv"), calmframe::Made(192, 128, 48, 50), 3, lossless);
   Run("ffmpeg -nostdin -v error -i '" + Path("drawn.mkv") + "' " + c.conversion + " '" +
       Path("in.mkv") + "'");
 

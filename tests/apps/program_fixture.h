@@ -5,26 +5,23 @@
 
 #include <gmock/gmock.h>
 #include <sys/wait.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cstdio>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <string>
 #include <vector>
 
 #include "host/media/clip.h"
-#include "synthetic/scene.h"
+#include "tests/support/drawn_clip.h"
+#include "tests/support/scratch_folder.h"
 
 namespace calmframe {
 
 namespace fs = std::filesystem;
-using media::ClipInfo;
 using media::ClipReader;
-using media::ClipWriter;
 using ::testing::HasSubstr;
 
 struct Outcome {
@@ -34,13 +31,8 @@ struct Outcome {
 
 class ProgramTest : public ::testing::Test {
  protected:
-  ProgramTest() {
-    std::string name = (fs::temp_directory_path() / "calmframe-program-XXXXXX").string();
-    folder_ = mkdtemp(name.data());
-  }
-  ~ProgramTest() override { fs::remove_all(folder_); }
-
-  std::string Path(const std::string& name) const { return folder_ / name; }
+  std::string Path(const std::string& name) const { return scratch_.In(name); }
+  std::string Content(const std::string& name) const { return scratch_.Content(name); }
 
   Outcome Run(const std::string& arguments) const { return RunAfter("", arguments); }
 
@@ -59,24 +51,9 @@ class ProgramTest : public ::testing::Test {
   }
 
   // A clip of the synthetic scene.
-  void MakeClip(const std::string& name, int width, int height, int frames) const {
-    ClipInfo info;
-    info.width = width;
-    info.height = height;
-    info.frame_rate = {30, 1};
-    info.frame_count = static_cast<std::size_t>(frames);
-    const auto writer = ClipWriter::Create(Path(name), info, width, height, {});
-    synthetic::scene_options options;
-    options.width = width;
-    options.height = height;
-    options.frame_count = frames;
-    const synthetic::scene scene(synthetic::street(1), synthetic::handheld_path({}), options);
-    std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(width * height));
-    for (int f = 0; f < frames; ++f) {
-      scene.render(f, pixels.data(), static_cast<std::size_t>(width));
-      writer->Write(static_cast<std::size_t>(f), pixels.data(), width * 4);
-    }
-    writer->Finish();
+  void MakeClip(const std::string& name, int width, int height, int frames,
+                media::Ratio pixel_aspect = {}) const {
+    WriteStreet(Path(name), Made(width, height, frames, 30, pixel_aspect), 1);
   }
 
   void MakeFile(const std::string& name, const std::string& content) const {
@@ -98,7 +75,8 @@ class ProgramTest : public ::testing::Test {
     EXPECT_THAT(outcome.text, HasSubstr(part));
   }
 
-  fs::path folder_;
+  const ScratchFolder scratch_;
+  const fs::path folder_ = scratch_.path();
 };
 
 }  // namespace calmframe

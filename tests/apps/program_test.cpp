@@ -66,15 +66,13 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
   ExpectOneLine(Run("stabilize in.mp4 out.mp4 --pixel-format yuv420"), "did you mean yuv420p?");
   ExpectOneLine(Run("stabilize in.mp4 no/such/folder.mp4"), "there is no folder no/such\n");
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "there.mp4"));
-  std::ifstream kept(Path("there.mp4"));
-  EXPECT_EQ(std::string(std::istreambuf_iterator<char>(kept), {}), "precious");
+  EXPECT_EQ(Content("there.mp4"), "precious");
   EXPECT_EQ(Run("stabilize in.mp4 there.mp4 --overwrite --quiet").code, 0);
   EXPECT_EQ(ClipReader::Open(Path("there.mp4"))->info().frame_count, 5u);
   // An encoder that likes to talk, and the tag that players want.
   EXPECT_THAT(Run("stabilize in.mp4 there.mp4 --overwrite --quiet --codec hevc").text,
               ::testing::Not(HasSubstr("x265 [")));
-  std::ifstream hevc(Path("there.mp4"));
-  EXPECT_THAT(std::string(std::istreambuf_iterator<char>(hevc), {}), HasSubstr("hvc1"));
+  EXPECT_THAT(Content("there.mp4"), HasSubstr("hvc1"));
 }
 
 TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
@@ -83,6 +81,10 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
     const char* part;
   } cases[] = {{"stabilise a b", "unknown command stabilise; did you mean stabilize?"},
                {"frobnicate", "unknown command frobnicate ("},
+               {"help frobnicate", "unknown command frobnicate ("},
+               {". b", ". is no command; to steady a clip: calmframe stabilize IN OUT"},
+               {"--smoothness 3 stabilize a b", "the command comes first"},
+               {"stabilize a b -q", "unknown flag -q ("},
                {"stabilize a b --smothness 3", "did you mean --smoothness?"},
                {"stabilize a b --smooth=3", "did you mean --smoothness?"},
                {"info a --smoothness 3", "unknown flag --smoothness (calmframe info --help"},
@@ -129,7 +131,12 @@ TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {
 }
 
 TEST_F(ProgramTest, JsonTellsEachStageAndHowItEnded) {
-  MakeClip("in.mp4", 160, 120, 30);
+  const std::string no_utf8 = "in\xff.mp4";
+  MakeClip(no_utf8, 160, 120, 30);
+  const std::string told = Run("analyze " + no_utf8 + " --json").text;
+  const auto last = nlohmann::json::parse(told.substr(told.rfind('\n', told.size() - 2) + 1));
+  EXPECT_EQ(last["frames"], 30) << told;
+  fs::rename(Path(no_utf8), Path("in.mp4"));
   const Outcome outcome = Run("stabilize in.mp4 out.mp4 --json --param \"Maximum Scale=120\"");
   EXPECT_EQ(outcome.code, 0) << outcome.text;
   std::vector<std::string> ended;
@@ -150,6 +157,14 @@ TEST_F(ProgramTest, AnalyzeTellsWithoutRendering) {
   EXPECT_EQ(plain.code, 0) << plain.text;
   EXPECT_THAT(plain.text, HasSubstr("in.mp4: 30 frames of 160x120\ncrop window "));
   EXPECT_THAT(plain.text, HasSubstr("Auto-scale (1"));
+  // Too little is told, and what is told is enough.
+  const std::string analyze = "analyze in.mp4 --project p.calm --quiet --maximum-scale ";
+  const std::string black = Run(analyze + "101").text;
+  ASSERT_THAT(black, HasSubstr("% of the picture stays black"));
+  const std::size_t scale = black.find("--maximum-scale ");
+  EXPECT_THAT(Run(analyze + black.substr(scale + 16, 3)).text,
+              ::testing::Not(HasSubstr("stays black")));
+  fs::remove(Path("p.calm"));
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4"));
 }
 
@@ -197,6 +212,8 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   EXPECT_EQ(tracks.code, 0) << tracks.text;
   EXPECT_EQ(fs::file_size(Path("t.trk")), 20u + 2000 * 40 * 16);
   EXPECT_EQ(Run("tracks away/work.calm away/work.calm").code, 4);  // nothing is written over
+  EXPECT_EQ(Run("tracks away/work.calm t.trk").code, 4);
+  ExpectOneLine(Run("tracks away/work.calm no/t.trk"), "there is no folder no\n");
   const Outcome other = Run("analyze other.mp4 --project away/work.calm");
   EXPECT_EQ(other.code, 3);
   ExpectOneLine(other, "is of another clip");

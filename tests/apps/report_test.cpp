@@ -24,16 +24,9 @@ Place CameraAt(int frame) {
 class ReportTest : public ProgramTest {
  protected:
   void MakeWallClip(const std::string& name) const {
-    ClipInfo info;
-    info.width = kWidth;
-    info.height = kHeight;
-    info.frame_rate = {30, 1};
-    info.frame_count = kFrames;
-    const auto writer = ClipWriter::Create(Path(name), info, kWidth, kHeight, {});
     const synthetic::texture& wall = synthetic::texture_of(synthetic::material::foliage);
-    std::vector<HX_Pixel8> pixels(kWidth * kHeight);
-    for (int f = 0; f < kFrames; ++f) {
-      const Place place = CameraAt(f);
+    const auto draw = [&wall](int frame, HX_Pixel8* pixels) {
+      const Place place = CameraAt(frame);
       const double c = std::cos(place.angle) / place.zoom / wall.side();
       const double s = std::sin(place.angle) / place.zoom / wall.side();
       for (int y = 0; y < kHeight; ++y) {
@@ -46,14 +39,8 @@ class ReportTest : public ProgramTest {
           pixels[y * kWidth + x] = {255, byte(seen[0]), byte(seen[1]), byte(seen[2])};
         }
       }
-      writer->Write(f, pixels.data(), kWidth * 4);
-    }
-    writer->Finish();
-  }
-
-  std::string Content(const std::string& name) const {
-    std::ifstream file(Path(name), std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
+    };
+    WriteClip(Path(name), Made(kWidth, kHeight, kFrames, 30), draw);
   }
 
   static nlohmann::json DataOf(const std::string& page) {
@@ -137,6 +124,44 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
   }
 }
 
+TEST_F(ReportTest, WithoutItsClipThePageHasAllButThePictures) {
+  MakeClip("wide.mkv", 160, 120, 20, {64, 45});
+  const Outcome told = Run("analyze wide.mkv --project w.calm --quiet");
+  ASSERT_EQ(told.code, 0) << told.text;
+  ASSERT_EQ(Run("report w.calm with.html --quiet").code, 0);
+  fs::rename(Path("wide.mkv"), Path("elsewhere"));
+  const Outcome outcome = Run("report w.calm without.html --quiet");
+  EXPECT_EQ(outcome.code, 0);
+  ExpectOneLine(outcome, "wide.mkv is gone; the page has no pictures");
+  const std::string page = Content("without.html");
+  EXPECT_THAT(page, HasSubstr("wide.mkv is gone; the page has no pictures</li>"));
+  EXPECT_EQ(page.find("<img"), std::string::npos);
+  EXPECT_EQ(DataOf(page), DataOf(Content("with.html")));
+  // The result is told as analyze tells it.
+  const std::string crop = told.text.substr(told.text.find("crop window"));
+  EXPECT_THAT(page, HasSubstr(crop.substr(0, crop.find('\n'))));
+  // Another clip in its place is none of its pictures.
+  MakeClip("wide.mkv", 160, 120, 6);
+  ExpectOneLine(Run("report w.calm other.html --quiet"), "is not the clip");
+  EXPECT_EQ(Content("other.html").find("<img"), std::string::npos);
+}
+
+TEST_F(ReportTest, OfNothingNothingIsDrawn) {
+  MakeClip("one.mp4", 64, 48, 1);
+  WriteClip(Path("blank.mp4"), Made(64, 48, 8, 30), [](int, HX_Pixel8* pixels) {
+    std::fill_n(pixels, 64 * 48, HX_Pixel8{255, 128, 128, 128});
+  });
+  for (const std::string name : {"one", "blank"}) {
+    ASSERT_EQ(Run("analyze " + name + ".mp4 --project " + name + ".calm --quiet").code, 0);
+    const Outcome outcome = Run("report " + name + ".calm " + name + ".html --quiet");
+    ASSERT_EQ(outcome.code, 0) << outcome.text;
+    const std::string page = Content(name + ".html");
+    EXPECT_EQ(page.find("id=\"path-x\""), std::string::npos) << name;
+    EXPECT_EQ(page.find(" nan"), std::string::npos) << name;
+  }
+  EXPECT_THAT(Content("blank.html"), HasSubstr("Nothing to track was found"));
+}
+
 TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
   MakeClip("in.mp4", 160, 120, 20);
   ASSERT_EQ(Run("analyze in.mp4 --project p.calm --quiet").code, 0);
@@ -178,8 +203,8 @@ TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
     EXPECT_EQ(path.find("nan"), std::string::npos) << plot;
   }
   std::size_t pictures = 0;
-  for (std::size_t at = 0; (at = dom.find("src=\"data:image/png;base64,", at)) != std::string::npos;
-       ++at) {
+  for (std::size_t at = 0;
+       (at = dom.find("src=\"data:image/jpeg;base64,", at)) != std::string::npos; ++at) {
     ++pictures;
   }
   EXPECT_EQ(pictures, 12u);

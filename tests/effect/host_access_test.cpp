@@ -38,54 +38,44 @@ class HostAccessTest : public testing::Test {
 };
 
 TEST_F(HostAccessTest, EverySuiteMayBeRefused) {
-  const std::vector<std::function<void()>> acquisitions = {
-      [&] { ScopedSuite<HX_ParamUtilsSuite3> suite(context_); },
-      [&] { ScopedSuite<HX_UtilitySuite> suite(context_, 3); },
-      [&] { ScopedSuite<HX_UtilitySuite> suite(context_, 4); },
-      [&] { ScopedSuite<HX_UtilitySuite> suite(context_, 5); },
-      [&] { ScopedSuite<HX_PrivateEffectSuite3> suite(context_); },
-      [&] { ScopedSuite<HX_AppSuite6> suite(context_); },
-      [&] { ScopedSuite<HX_AdvAppSuite1> suite(context_); },
-      [&] { ScopedSuite<HX_WorldSuite2> suite(context_); },
-      [&] { ScopedSuite<HX_StringSuite1> suite(context_); },
-      [&] { ScopedSuite<HX_AnalysisHostSuite1> suite(context_); },
-      [&] { ScopedSuite<HX_StabilizerHostSuite7> suite(context_); },
-      [&] { ScopedSuite<HX_OpaqueEffectDataSuite1> suite(context_); },
-      [&] { ScopedSuite<HX_SequenceInfoSuite> suite(context_, 2); },
-      [&] { ScopedSuite<HX_SequenceInfoSuite> suite(context_, 3); },
-      [&] { ScopedSuite<HX_VideoSegmentSuite5> suite(context_); },
-      [&] { ScopedSuite<HX_VideoSegmentRenderSuite3> suite(context_); },
-      [&] { ScopedSuite<HX_CutPixSuite1> suite(context_); },
-      [&] { ScopedSuite<HX_CutPixCacheSuite5> suite(context_); },
-      [&] { ScopedSuite<HX_BlurSuite1> suite(context_); }};
-  const std::vector<std::string> asked = {"HX Param Utils Suite 3",
-                                          "HX Utility Suite 3",
-                                          "HX Utility Suite 4",
-                                          "HX Utility Suite 5",
-                                          "HX OV Private Effect Suite 3",
-                                          "HX OV App Suite 6",
-                                          "HX OV Adv App Suite 1",
-                                          "HX World Suite 2",
-                                          "Rushbase StringSuite 1",
-                                          "Analysis Host Suite 1",
-                                          "Stabilizer Host Suite 7",
-                                          "Opaque Effect Data Suite 1",
-                                          "Rushbase Sequence Info Suite 2",
-                                          "Rushbase Sequence Info Suite 3",
-                                          "Rushbase Video Segment Suite 5",
-                                          "Rushbase Video Segment Render Suite 3",
-                                          "Cutline CutPix Suite 1",
-                                          "Cutline CutPix Cache Suite 5",
-                                          "FLT Blur Suite 1"};
-  ASSERT_EQ(acquisitions.size(), asked.size());
-  for (std::size_t i = 0; i < asked.size(); ++i) {
-    const std::size_t space = asked[i].rfind(' ');
-    host_.Offer(asked[i].substr(0, space), std::stoi(asked[i].substr(space)), &host_);
-    EXPECT_EQ(Thrown(acquisitions[i]), 0) << asked[i];
+  const struct {
+    std::function<void()> acquire;
+    const char* name;
+    std::int32_t version;
+  } suites[] = {
+      {[&] { ScopedSuite<HX_ParamUtilsSuite3> suite(context_); }, "HX Param Utils Suite", 3},
+      {[&] { ScopedSuite<HX_UtilitySuite> suite(context_, 3); }, "HX Utility Suite", 3},
+      {[&] { ScopedSuite<HX_UtilitySuite> suite(context_, 4); }, "HX Utility Suite", 4},
+      {[&] { ScopedSuite<HX_UtilitySuite> suite(context_, 5); }, "HX Utility Suite", 5},
+      {[&] { ScopedSuite<HX_PrivateEffectSuite3> suite(context_); }, "HX OV Private Effect Suite",
+       3},
+      {[&] { ScopedSuite<HX_AppSuite6> suite(context_); }, "HX OV App Suite", 6},
+      {[&] { ScopedSuite<HX_AdvAppSuite1> suite(context_); }, "HX OV Adv App Suite", 1},
+      {[&] { ScopedSuite<HX_WorldSuite2> suite(context_); }, "HX World Suite", 2},
+      {[&] { ScopedSuite<HX_StringSuite1> suite(context_); }, "Rushbase StringSuite", 1},
+      {[&] { ScopedSuite<HX_AnalysisHostSuite1> suite(context_); }, "Analysis Host Suite", 1},
+      {[&] { ScopedSuite<HX_StabilizerHostSuite7> suite(context_); }, "Stabilizer Host Suite", 7},
+      {[&] { ScopedSuite<HX_OpaqueEffectDataSuite1> suite(context_); }, "Opaque Effect Data Suite",
+       1},
+      {[&] { ScopedSuite<HX_SequenceInfoSuite> suite(context_, 2); },
+       "Rushbase Sequence Info Suite", 2},
+      {[&] { ScopedSuite<HX_SequenceInfoSuite> suite(context_, 3); },
+       "Rushbase Sequence Info Suite", 3},
+      {[&] { ScopedSuite<HX_VideoSegmentSuite5> suite(context_); }, "Rushbase Video Segment Suite",
+       5},
+      {[&] { ScopedSuite<HX_VideoSegmentRenderSuite3> suite(context_); },
+       "Rushbase Video Segment Render Suite", 3},
+      {[&] { ScopedSuite<HX_CutPixSuite1> suite(context_); }, "Cutline CutPix Suite", 1},
+      {[&] { ScopedSuite<HX_CutPixCacheSuite5> suite(context_); }, "Cutline CutPix Cache Suite", 5},
+      {[&] { ScopedSuite<HX_BlurSuite1> suite(context_); }, "FLT Blur Suite", 1}};
+  for (const auto& suite : suites) {
+    host_.Offer(suite.name, suite.version, &host_);
+    EXPECT_EQ(Thrown(suite.acquire), 0) << suite.name;
     EXPECT_FALSE(host_.ShowsMessage());
     host_.FailOperation(1);
-    EXPECT_EQ(Thrown(acquisitions[i]), 13) << asked[i];
-    EXPECT_EQ(host_.operations().back().name, "acquire " + asked[i]);
+    EXPECT_EQ(Thrown(suite.acquire), 13) << suite.name;
+    EXPECT_EQ(host_.operations().back().name,
+              "acquire " + std::string(suite.name) + " " + std::to_string(suite.version));
     EXPECT_STREQ(host_.out.return_msg, "Not able to acquire OVK Suite.");
     EXPECT_TRUE(host_.ShowsMessage());
     host_.Prepare();

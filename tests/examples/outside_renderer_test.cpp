@@ -15,43 +15,21 @@
 #include <vector>
 
 #include "examples/outside_renderer/comparison.h"
-#include "host/media/clip.h"
-#include "synthetic/scene.h"
 #include "tests/host/tour/played_plugin.h"
+#include "tests/support/drawn_clip.h"
+#include "tests/support/scratch_folder.h"
 
 namespace {
 
 namespace fs = std::filesystem;
-using calmframe::media::ClipInfo;
-using calmframe::media::ClipWriter;
 
 constexpr int kLevels = 2;  // of 255
 
 class OutsideRendererProgram : public testing::Test {
  protected:
   OutsideRendererProgram() {
-    std::string name = (fs::temp_directory_path() / "calmframe-outside-XXXXXX").string();
-    folder_ = mkdtemp(name.data());
-    ClipInfo info;
-    info.width = 240;
-    info.height = 136;
-    info.pixel_aspect = {4, 3};
-    info.frame_rate = {25, 1};
-    info.frame_count = 24;
-    const auto writer = ClipWriter::Create(folder_ / "clip.mkv", info, info.width, info.height, {});
-    synthetic::scene_options options;
-    options.width = info.width;
-    options.height = info.height;
-    options.frame_count = 24;
-    const synthetic::scene scene(synthetic::street(3), synthetic::handheld_path({}), options);
-    std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(info.width * info.height));
-    for (int f = 0; f < 24; ++f) {
-      scene.render(f, pixels.data(), info.width);
-      writer->Write(static_cast<std::size_t>(f), pixels.data(), info.width * 4);
-    }
-    writer->Finish();
+    calmframe::WriteStreet(folder_ / "clip.mkv", calmframe::Made(240, 136, 24, 25, {4, 3}), 3);
   }
-  ~OutsideRendererProgram() override { fs::remove_all(folder_); }
 
   // What it prints. Drivers of OpenGL keep memory to the end.
   std::string Run(const std::string& flags) {
@@ -84,7 +62,8 @@ class OutsideRendererProgram : public testing::Test {
   }
 
  private:
-  fs::path folder_;
+  const ScratchFolder scratch_;
+  const fs::path folder_ = scratch_.path();
 };
 
 TEST_F(OutsideRendererProgram, DrawsInPlainCode) {

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "host/media/clip.h"
+#include "tests/support/scratch_folder.h"
 
 namespace calmframe::media {
 
@@ -29,16 +30,11 @@ inline std::string Output(const std::string& command) {
 // A folder of its own for each test, with small clips and their pixels.
 class ClipTest : public testing::Test {
  protected:
-  ClipTest() {
-    std::string name = (std::filesystem::temp_directory_path() / "media-test-XXXXXX").string();
-    folder_ = mkdtemp(name.data());
-  }
-  ~ClipTest() override { std::filesystem::remove_all(folder_); }
-
-  std::string In(const std::string& name) const { return (folder_ / name).string(); }
+  std::string In(const std::string& name) const { return folder_.In(name); }
+  std::string Content(const std::string& name) const { return folder_.Content(name); }
 
   std::size_t Files() const {
-    const std::filesystem::directory_iterator all(folder_);
+    const std::filesystem::directory_iterator all(folder_.path());
     return static_cast<std::size_t>(std::distance(begin(all), end(all)));
   }
 
@@ -90,7 +86,7 @@ class ClipTest : public testing::Test {
   }
 
  private:
-  std::filesystem::path folder_;
+  const ScratchFolder folder_;
 };
 
 template <class Pixel>

@@ -26,11 +26,6 @@ class UnusualMediaTest : public ClipTest {
     return times;
   }
 
-  std::string Content(const std::string& name) const {
-    std::ifstream file(In(name), std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
-  }
-
   // Frames, times and pixels against those of the ffmpeg program.
   void ExpectAsDecoded(const std::string& name) {
     const auto reader = ClipReader::Open(In(name));
@@ -139,7 +134,8 @@ TEST_F(UnusualMediaTest, FramesTimesAndPixelsAreTheFilesOwn) {
 }
 
 TEST_F(UnusualMediaTest, EveryTurnAndMirrorImage) {
-  Ffmpeg("-f lavfi -i testsrc=s=64x32:r=25:d=0.1 -c:v libx264rgb -qp 0 " + In("flat.mp4"));
+  Ffmpeg("-f lavfi -i testsrc=s=64x32:r=25:d=0.1,setsar=2/1 -c:v libx264rgb -qp 0 " +
+         In("flat.mp4"));
   const auto flat = ReadFrame<HX_Pixel8>(*ClipReader::Open(In("flat.mp4")), 1);
   const std::string bytes = Content("flat.mp4");
   const std::size_t matrix = bytes.find("tkhd") + 44;
@@ -163,6 +159,8 @@ TEST_F(UnusualMediaTest, EveryTurnAndMirrorImage) {
     const auto reader = ClipReader::Open(In("turned.mp4"));
     const int width = a != 0 ? 64 : 32;
     ASSERT_EQ(reader->info().width, width);
+    const Ratio aspect = reader->info().pixel_aspect;
+    EXPECT_EQ(aspect.num * (a != 0 ? 1 : 2), aspect.den * (a != 0 ? 2 : 1));
     const auto shown = ReadFrame<HX_Pixel8>(*reader, 1);
     int wrong = 0;
     for (int y = 0; y < 32; ++y) {
@@ -176,17 +174,24 @@ TEST_F(UnusualMediaTest, EveryTurnAndMirrorImage) {
     }
     EXPECT_EQ(wrong, 0);
   }
+  // The sense of the turn is the one that players take.
+  Ffmpeg("-i " + In("flat.mp4") + " -c copy -metadata:s:v rotate=90 " + In("turned.mp4"));
+  Ffmpeg("-i " + In("turned.mp4") + " -c:v ffv1 -pix_fmt bgr0 -metadata:s:v rotate=0 " +
+         In("shown.mkv"));
+  EXPECT_TRUE(SamePixels(ReadFrame<HX_Pixel8>(*ClipReader::Open(In("turned.mp4")), 1),
+                         ReadFrame<HX_Pixel8>(*ClipReader::Open(In("shown.mkv")), 1)));
 }
 
 TEST_F(UnusualMediaTest, FieldsInBothOrders) {
   for (const bool top : {true, false}) {
     Ffmpeg(std::string("-f lavfi -i testsrc2=s=64x64:r=50:d=0.4 -vf interlace=lowpass=off:scan=") +
            (top ? "tff" : "bff") + " -c:v libx264 -flags +ilme+ildct -x264-params " +
-           (top ? "tff" : "bff") + "=1 " + In("i.mp4"));
-    EXPECT_EQ(ClipReader::Open(In("i.mp4"))->info().field_order,
+           (top ? "tff" : "bff") + "=1 " + In("i.ts"));
+    // Told by the frames alone.
+    EXPECT_EQ(ClipReader::Open(In("i.ts"))->info().field_order,
               top ? FieldOrder::top_first : FieldOrder::bottom_first);
     // Upside down, the other field's rows are on top.
-    Ffmpeg("-i " + In("i.mp4") + " -c copy -metadata:s:v rotate=180 " + In("turned.mp4"));
+    Ffmpeg("-i " + In("i.ts") + " -c copy -metadata:s:v rotate=180 " + In("turned.mp4"));
     EXPECT_EQ(ClipReader::Open(In("turned.mp4"))->info().field_order,
               top ? FieldOrder::bottom_first : FieldOrder::top_first);
   }

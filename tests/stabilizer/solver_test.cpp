@@ -11,6 +11,7 @@
 #include "platform/tessel/threads.h"
 #include "stabilizer/effect/src/parameter_rules.h"
 #include "synthetic/track_world.h"
+#include "tests/support/shaken_table.h"
 
 namespace {
 
@@ -20,21 +21,6 @@ using marrow::tracking::AllFeatures;
 
 constexpr std::uint32_t kWidth = 640;
 constexpr std::uint32_t kHeight = 360;
-
-// Tracks of a rigid scene shaken in both directions, all alive throughout.
-AllFeatures ShakenTable(std::int32_t frames, std::int32_t slots) {
-  AllFeatures table;
-  table.feature_count = slots;
-  table.frame_count = frames;
-  for (std::int32_t f = 0; f < frames; ++f) {
-    for (std::int32_t s = 0; s < slots; ++s) {
-      table.features->push_back({static_cast<float>(20 + (s * 37) % 600 + 4 * std::sin(1.7 * f)),
-                                 static_cast<float>(20 + (s * 53) % 320 + 3 * std::cos(2.3 * f)),
-                                 f == 0 ? 1 : 0, 1.0f});
-    }
-  }
-  return table;
-}
 
 SolverParamsRecord Params() {
   kelp::effect::ClipGeometry clip;

@@ -68,20 +68,6 @@ HX_Err Entry(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef*
   return EffectMain<StabilizerEffect>(command, in, out, params, output, extra);
 }
 
-AllFeatures ShakenTable(std::int32_t frames, std::int32_t slots) {
-  AllFeatures table;
-  table.feature_count = slots;
-  table.frame_count = frames;
-  for (std::int32_t f = 0; f < frames; ++f) {
-    for (std::int32_t s = 0; s < slots; ++s) {
-      table.features->push_back({static_cast<float>(20 + (s * 37) % 600 + 4 * std::sin(1.7 * f)),
-                                 static_cast<float>(20 + (s * 53) % 320 + 3 * std::cos(2.3 * f)),
-                                 f == 0 ? 1 : 0, 1.0f});
-    }
-  }
-  return table;
-}
-
 boost::shared_ptr<const CPWarper> ShiftingWarper(
     int width, int height, const std::vector<marrow::stabilization::point2>& shifts,
     std::int32_t map_radius) {

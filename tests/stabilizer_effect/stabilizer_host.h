@@ -12,14 +12,12 @@
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "tests/analysis/fake_host.h"
 #include "tests/effect/fake_host.h"
+#include "tests/support/shaken_table.h"
 
 namespace kelp::effect {
 
 HX_Err Entry(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef* params[],
              HX_World* output, void* extra);
-
-// Tracks of a rigid scene shaken in both directions, all alive throughout, in 640 x 360.
-marrow::tracking::AllFeatures ShakenTable(std::int32_t frames, std::int32_t slots);
 
 // One record a frame that moves the rest grid; solved, as far as anybody can tell.
 // With a map of that radius, each frame lies by its own shift in every other's output too.

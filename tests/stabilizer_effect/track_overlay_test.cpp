@@ -1,30 +1,20 @@
 #include <gtest/gtest.h>
 
-#include "tests/stabilizer_effect/stabilizer_host.h"
+#include "tests/stabilizer_effect/render_service_fixture.h"
 
 namespace kelp::effect {
 namespace {
 
-constexpr int kWidth = 64, kHeight = 48;
 constexpr double kDot = 3.14 * 5.3 * 5.3;  // pixels that a dot touches
 
 // A solved clip of two frames whose one track is at (20, 20) and (24, 23), shown with its tracks.
-class TrackOverlayTest : public ::testing::Test {
+class TrackOverlayTest : public RenderServiceTest {
  protected:
-  TrackOverlayTest() : source_(kWidth, kHeight, 8) {
-    UseDepth(8);
+  TrackOverlayTest() {
     test.Solved(ShiftingWarper(kWidth, kHeight, {{0, 0}, {10, 6}}), {});
     test.Set(kShowTracksIndex, 1);
-    test.Set(kFramingIndex, static_cast<int>(Framing::stabilize_only));
+    SetFraming(Framing::stabilize_only);
     test.RenderCopy();
-  }
-  void UseDepth(std::int32_t depth) {
-    source_ = TestWorld(kWidth, kHeight, depth);
-    for (int y = 0; y < kHeight; ++y) {
-      for (int x = 0; x < kWidth; ++x) source_.Set(x, y, x / 100.0, y / 100.0);
-    }
-    test.host.params[0].u.ld = *source_.get();
-    test.pixels = source_.get();
   }
   HX_Err RenderDirect(TestWorld& output) {
     EXPECT_EQ(test.Call(HX_CMD_PREPARE_FRAME), HX_ERR_NONE);
@@ -41,9 +31,6 @@ class TrackOverlayTest : public ::testing::Test {
     }
     return changed;
   }
-
-  StabilizerHost test;
-  TestWorld source_;
 };
 
 TEST_F(TrackOverlayTest, BothPathsAndPartsShowTheInputWithItsTracksAtEveryDepth) {

@@ -11,6 +11,7 @@
 
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
+#include "tests/support/scratch_folder.h"
 
 namespace calmframe::host {
 namespace {
@@ -21,14 +22,11 @@ using ::testing::HasSubstr;
 class ProjectTest : public testing::Test {
  protected:
   ProjectTest() {
-    std::string name = (fs::temp_directory_path() / "calmframe-project-XXXXXX").string();
-    folder_ = mkdtemp(name.data());
-    fs::create_directories(folder_ / "clips");
+    fs::create_directories(Path("clips"));
     WriteFile(Path("clips/walk.mp4"), "a walk");
   }
-  ~ProjectTest() override { fs::remove_all(folder_); }
 
-  std::string Path(const std::string& name) const { return folder_ / name; }
+  std::string Path(const std::string& name) const { return folder_.In(name); }
   static void WriteFile(const std::string& path, const std::string& text) {
     std::ofstream(path) << text;
   }
@@ -40,6 +38,7 @@ class ProjectTest : public testing::Test {
     project.clip_content = ContentOf(project.clip_path);
     project.width = 1920;
     project.height = 1080;
+    project.pixel_aspect = {64, 45};
     project.start_frame = -3;
     project.length = 495 + mark;
     project.ticks_per_frame = 23543520;
@@ -54,6 +53,8 @@ class ProjectTest : public testing::Test {
     EXPECT_EQ(a.clip_content, b.clip_content);
     EXPECT_EQ(a.width, b.width);
     EXPECT_EQ(a.height, b.height);
+    EXPECT_EQ(a.pixel_aspect.num, b.pixel_aspect.num);
+    EXPECT_EQ(a.pixel_aspect.den, b.pixel_aspect.den);
     EXPECT_EQ(a.start_frame, b.start_frame);
     EXPECT_EQ(a.length, b.length);
     EXPECT_EQ(a.ticks_per_frame, b.ticks_per_frame);
@@ -72,7 +73,7 @@ class ProjectTest : public testing::Test {
     return "";
   }
 
-  fs::path folder_;
+  const ScratchFolder folder_;
 };
 
 TEST_F(ProjectTest, WhatIsSavedComesBackToTheBit) {
@@ -83,7 +84,8 @@ TEST_F(ProjectTest, WhatIsSavedComesBackToTheBit) {
     ExpectSame(LoadProject(path), saved);
   }
   EXPECT_EQ(LoadProject(path).clip_relative, "clips/walk.mp4");
-  EXPECT_EQ(std::distance(fs::directory_iterator(folder_), {}), 2);  // the project and the clips
+  EXPECT_EQ(std::distance(fs::directory_iterator(folder_.path()), {}),
+            2);  // the project and the clips
 }
 
 TEST_F(ProjectTest, TheClipIsFoundWhereverItWentAndKnownWhenItChanged) {
@@ -108,13 +110,38 @@ TEST_F(ProjectTest, TheClipIsFoundWhereverItWentAndKnownWhenItChanged) {
   EXPECT_THAT(Refusal([&] { FindClip(Path("moved/walk.calm"), project); }), HasSubstr("is gone"));
 }
 
+TEST_F(ProjectTest, AProjectOfTheFirstVersionIsTakenWithSquarePixels) {
+  const std::string path = Path("old.calm");
+  SqliteDatabase(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
+      .Run(
+          "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
+          "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
+          "CREATE TABLE instance (id INTEGER PRIMARY KEY, bytes BLOB NOT NULL);"
+          "PRAGMA application_id = 1130458221; PRAGMA user_version = 1;"
+          "INSERT INTO setting VALUES ('clip_path', '/clips/walk.mp4'),"
+          "('clip_relative', 'clips/walk.mp4'),"
+          "('clip_content', '00112233-4455-6677-8899-aabbccddeeff'), ('width', 1920),"
+          "('height', 1080), ('start_frame', -3), ('length', 495),"
+          "('ticks_per_frame', 23543520), ('field_type', 1),"
+          "('match_name', 'KLPX SubspaceStabilizer'),"
+          "('checksum', 'ea2167a1-b2b9-170e-9991-37971d8e65f8');"
+          "INSERT INTO parameter VALUES (20, 50.0);"
+          "INSERT INTO instance VALUES (1, X'010203');");
+  const Project project = LoadProject(path);
+  EXPECT_EQ(project.length, 495);
+  EXPECT_EQ(project.pixel_aspect.num, 1);
+  EXPECT_EQ(project.pixel_aspect.den, 1u);
+  SaveProject(path, Sample(2));
+  ExpectSame(LoadProject(path), Sample(2));
+}
+
 TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
   WriteFile(Path("notes.calm"), std::string(5000, 'n'));
   WriteFile(Path("empty.calm"), "");
   SqliteDatabase(Path("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
       .Run("CREATE TABLE t (x)");
   SaveProject(Path("newer.calm"), Sample(1));
-  SqliteDatabase(Path("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 2");
+  SqliteDatabase(Path("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 3");
   const struct {
     const char* name;
     const char* cause;
@@ -141,8 +168,7 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
 
 TEST_F(ProjectTest, DamageIsToldAndNeverMore) {
   SaveProject(Path("whole.calm"), Sample(1, 3000));
-  std::ifstream file(Path("whole.calm"), std::ios::binary);
-  const std::string whole{std::istreambuf_iterator<char>(file), {}};
+  const std::string whole = folder_.Content("whole.calm");
   for (std::size_t at = 0; at < whole.size(); at += 97) {
     std::string damaged = whole;
     damaged[at] = static_cast<char>(~damaged[at]);

@@ -1,89 +1,10 @@
-#include "apps/calmframe/solved_clip.h"
-
-#include <unistd.h>
+#include "apps/report/solved_clip.h"
 
 #include <algorithm>
 #include <cmath>
-#include <cstdio>
-#include <cstring>
-#include <filesystem>
-#include <fstream>
-#include <iterator>
-#include <limits>
-#include <sstream>
 
-#include "apps/calmframe/failures.h"
-#include "apps/calmframe/track_export.h"
-
-namespace calmframe {
+namespace calmframe::report {
 namespace {
-
-namespace fs = std::filesystem;
-using report::Match;
-using report::Point;
-
-// A folder that goes with the object.
-class ScratchFolder {
- public:
-  ScratchFolder() {
-    std::string name = (fs::temp_directory_path() / "calmframe-XXXXXX").string();
-    if (!mkdtemp(name.data())) throw SolveFailure("no folder for temporary files can be made");
-    path_ = name;
-  }
-  ~ScratchFolder() {
-    std::error_code ignored;
-    fs::remove_all(path_, ignored);
-  }
-  ScratchFolder(const ScratchFolder&) = delete;
-  ScratchFolder& operator=(const ScratchFolder&) = delete;
-  const fs::path& path() const { return path_; }
-
- private:
-  fs::path path_;
-};
-
-// A track file as docs/track_file.md tells it.
-struct TrackTable {
-  struct Cell {
-    float x = 0, y = 0;
-    std::int32_t status = -1;
-    float correlation = 0;
-    bool alive() const { return status >= 0; }
-    bool begins() const { return status > 0; }
-  };
-  std::size_t rows = 0, slots = 0;
-  std::vector<Cell> cells;
-  const Cell& At(std::size_t row, std::size_t slot) const { return cells[row * slots + slot]; }
-};
-
-TrackTable ReadTracks(SteadyClip& clip, const std::string& shown) {
-  const ScratchFolder folder;
-  const std::string path = folder.path() / "tracks.trk";
-  SaveTracks(clip, shown, path);
-  std::ifstream file(path, std::ios::binary);
-  std::int64_t marker = 0;
-  std::int32_t first = 0, end = 0;
-  std::uint32_t slots = 0;
-  const auto read = [&file](auto& to, std::size_t bytes) {
-    return static_cast<bool>(
-        file.read(reinterpret_cast<char*>(&to), static_cast<std::streamsize>(bytes)));
-  };
-  TrackTable table;
-  const bool whole = read(marker, sizeof marker) && read(first, sizeof first) &&
-                     read(end, sizeof end) && read(slots, sizeof slots) && marker == -11 &&
-                     first == 0 && end >= 0;
-  if (whole) {
-    table.rows = static_cast<std::size_t>(end);
-    table.slots = slots;
-    table.cells.resize(table.rows * table.slots);
-  }
-  static_assert(sizeof(TrackTable::Cell) == 16);
-  if (!whole || (!table.cells.empty() &&
-                 !read(table.cells.front(), table.cells.size() * sizeof(TrackTable::Cell)))) {
-    throw SolveFailure(shown + ": its tracks can't be read");
-  }
-  return table;
-}
 
 // Where a warp takes a place of the frame. Between the grid's vertices by both sides' proportion,
 // which a cell of some 30 pixels leaves right to a fraction of a pixel.
@@ -112,10 +33,8 @@ Point Warped(const HX_VarVector& warp, int width, int height, Point place) {
 
 }  // namespace
 
-SolvedClip ReadSolve(SteadyClip& clip, const std::string& shown) {
-  const TrackTable table = ReadTracks(clip, shown);
-  const auto& exports = clip.host().library().exports();
-  const void* block = clip.effect().opaque_data();
+std::optional<SolvedClip> ReadSolve(const host::PluginExports& exports, const void* block,
+                                    const TrackTable& table, double pixel_aspect) {
   SolvedClip solved;
   std::int32_t frames = 0, first = 0, columns = 0, rows = 0, source_width = 0, source_height = 0;
   float min_x = 0, min_y = 0, max_x = 0, max_y = 0;
@@ -123,13 +42,11 @@ SolvedClip ReadSolve(SteadyClip& clip, const std::string& shown) {
       !exports.get_stabilizer_data(block, &frames, &first, &columns, &rows, &solved.crop_width,
                                    &solved.crop_height, &min_x, &min_y, &max_x, &max_y,
                                    &source_width, &source_height)) {
-    throw SolveFailure(shown + ": holds no solve");
+    return {};
   }
-  const media::Ratio aspect = clip.info().pixel_aspect;
   solved.height = source_height;
-  solved.width = static_cast<int>(
-      std::lround(static_cast<double>(source_width) * static_cast<double>(aspect.num) /
-                  static_cast<double>(aspect.den)));
+  solved.width = static_cast<int>(std::lround(source_width * pixel_aspect));
+  solved.track_life = MedianLife(table);
   const double stretch = static_cast<double>(solved.width) / std::max(source_width, 1);
   const Point centre{(solved.width - 1) / 2.0, (solved.height - 1) / 2.0};
 
@@ -159,8 +76,8 @@ SolvedClip ReadSolve(SteadyClip& clip, const std::string& shown) {
     solved.begun.push_back(begun);
     solved.lost.push_back(lost);
     if (row > 0) {
-      solved.before.push_back(report::FitMotion(before, centre));
-      solved.after.push_back(report::FitMotion(after, centre));
+      solved.before.push_back(FitMotion(before, centre));
+      solved.after.push_back(FitMotion(after, centre));
     }
     previous = warped;
     if (solved.crop_width > 0) {
@@ -173,19 +90,4 @@ SolvedClip ReadSolve(SteadyClip& clip, const std::string& shown) {
   return solved;
 }
 
-std::vector<double> ScoresIn(const std::string& log, std::size_t frames) {
-  std::vector<double> scores(frames, std::numeric_limits<double>::quiet_NaN());
-  std::istringstream lines(log);
-  for (std::string line; std::getline(lines, line);) {
-    std::size_t frame = 0;
-    double score = 0;
-    if (std::sscanf(line.c_str(), "frame %zu: displacements %*d, models %*d, score %lf", &frame,
-                    &score) == 2 &&
-        frame < frames) {
-      scores[frame] = score;
-    }
-  }
-  return scores;
-}
-
-}  // namespace calmframe
+}  // namespace calmframe::report
