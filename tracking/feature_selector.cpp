@@ -56,30 +56,34 @@ void FeatureSelector::Configure(std::size_t width, std::size_t height) {
   gradient_sums_ = std::make_unique<GradientSums>(params_.half_winx, params_.half_winy, width);
   score_rows_.resize(3 * (scoring_region_.x1 - scoring_region_.x0));
   maxima_.reserve(width);
+  std::vector<float> kernel = {1.0f};
   if (params_.presmoothing && params_.presmooth_factor > 0.0f) {
     const std::uint64_t longer = std::max(params_.half_winx, params_.half_winy);
     const double sigma = std::min(static_cast<double>(2 * longer + 1) * params_.presmooth_factor,
                                   static_cast<double>(std::max(width, height)));
-    std::vector<float> kernel = IntegratedGaussian(sigma);
-    const std::uint64_t radius = kernel.size() / 2;
-    smoothing_region_ =
-        Inset(width, height, AtLeastZero(gradient_x, radius), AtLeastZero(gradient_y, radius));
-    smoother_ = std::make_unique<SeparableSmoother>(std::move(kernel), width);
+    kernel = IntegratedGaussian(sigma);
   }
+  const std::uint64_t radius = kernel.size() / 2;
+  smoothing_region_ =
+      Inset(width, height, AtLeastZero(gradient_x, radius), AtLeastZero(gradient_y, radius));
+  smoother_ =
+      std::make_unique<SeparableSmoother>(std::move(kernel), width, gradient_sums_->kept_rows());
 }
 
 FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
   candidates.clear();
   const PixelRegion& region = scoring_region_;
   if (region.empty()) return {};
-  if (smoother_) smoother_->Smooth(luma_.data(), width_, smoothing_region_);
-
   // A score's neighbours all lie in the scoring region, whose outermost pixels are never
   // candidates. Three rows of scores are kept, so each is still in the cache when it is compared.
   const std::size_t columns = region.x1 - region.x0;
   const auto score_row = [&](std::size_t y) { return score_rows_.data() + y % 3 * columns; };
   float best = -100000.0f;
-  gradient_sums_->Start(luma_.data(), width_, region);
+  smoother_->Start(luma_.data(), width_, smoothing_region_);
+  const PixelRegion& smooth = smoothing_region_;
+  gradient_sums_->Start(
+      [this](std::size_t y) { return smoother_->Row(y); },
+      {region.x0 - smooth.x0, region.y0 - smooth.y0, region.x1 - smooth.x0, region.y1 - smooth.y0});
   for (std::size_t y = region.y0; y < region.y1; ++y) {
     ScoreRow(gradient_sums_->NextRow(), columns, params_.eig_ratio_threshold, score_row(y));
     if (y < region.y0 + 2) continue;

@@ -39,8 +39,8 @@ class FeatureSelector {
   std::size_t width() const { return width_; }
   std::size_t height() const { return height_; }
 
-  // Where the frame goes, width * height each. ComputeCandidates smooths the luma in place.
-  float* luma() { return luma_.data(); }         // 0 to 255
+  // Where the frame goes, width * height each.
+  std::uint8_t* luma() { return luma_.data(); }
   std::uint8_t* mask() { return mask_.data(); }  // 0 where no feature may be selected
 
   // Fills `candidates`, by falling score (equal scores by position), and returns the first and the
@@ -69,7 +69,7 @@ class FeatureSelector {
   std::size_t spacing_ = 0;
   PixelRegion smoothing_region_{};
   PixelRegion scoring_region_{};
-  std::vector<float> luma_;
+  std::vector<std::uint8_t> luma_;
   std::vector<std::uint8_t> mask_;
   std::vector<std::uint8_t> available_;  // by pixel: 1 until a disc covers it
   std::unique_ptr<SeparableSmoother> smoother_;

@@ -24,7 +24,7 @@ TEST(GradientSumsTest, WindowSumsOfWholeNumbersAreExactAtEverySize) {
       }
       GradientSums sums(hx, hy, w);
       const PixelRegion region{hx + 1u, hy + 1u, hx + 1u + columns, hy + 1u + rows};
-      sums.Start(image.data(), stride, region);
+      sums.Start([&](std::size_t y) { return image.data() + y * stride; }, region);
       for (int y = hy + 1; y < hy + 1 + rows; ++y) {
         gradient_sum_row row = sums.NextRow();
         for (int x = hx + 1, i = 0; i < columns; ++x, ++i) {
@@ -54,7 +54,8 @@ TEST(GradientSumsTest, StrongTextureLeavesNoTraceBehindIt) {
     for (int x = 0; x < 60; ++x) image[y * kSide + x] = value(random);
   }
   GradientSums sums(15, 15, kSide);
-  sums.Start(image.data(), kSide, {16, 16, kSide - 16, kSide - 16});
+  sums.Start([&](std::size_t y) { return image.data() + y * kSide; },
+             {16, 16, kSide - 16, kSide - 16});
   for (int y = 16; y < kSide - 16; ++y) {
     gradient_sum_row row = sums.NextRow();
     for (int x = 16; x < kSide - 16; ++x) {
