@@ -112,7 +112,7 @@ void RowStages(benchmark::State& state) {
       const auto row = [&](std::size_t r) { return &scores[r % 3 * columns]; };
       const gradient_sum_row sum = sums.NextRow();
       if (kStages > 1) ScoreRow(sum, columns, params.eig_ratio_threshold, row(y));
-      if (kStages > 2 && y > 1) FindMaxima(row(y - 2), row(y - 1), row(y), columns, maxima);
+      if (kStages > 2 && y > 1) FindMaxima(row(y - 2), row(y - 1), row(y), columns, 441.0f, maxima);
       benchmark::ClobberMemory();
     }
   }

@@ -58,9 +58,9 @@ class FeatureSelector {
   std::vector<Feature> selected;
 
  private:
-  void ClearDiscAroundFeature(float x, float y);
-  void ClearDiscAroundCandidate(std::int64_t column, std::int64_t row);
-  void ClearSpan(std::int64_t row, std::int64_t first, std::int64_t last);
+  void CoverDiscAroundFeature(float x, float y);
+  void CoverDiscAroundCandidate(std::int64_t column, std::int64_t row);
+  void CoverSpan(std::int64_t row, std::int64_t first, std::int64_t last);
   void Select(std::size_t limit);
 
   SelectorParams params_;
@@ -71,7 +71,8 @@ class FeatureSelector {
   PixelRegion scoring_region_{};
   std::vector<std::uint8_t> luma_;
   std::vector<std::uint8_t> mask_;
-  std::vector<std::uint8_t> available_;  // by pixel: 1 until a disc covers it
+  std::vector<std::uint8_t> covered_;  // by pixel: the mark of the last selection with a disc on it
+  std::uint8_t covered_mark_ = 0;
   std::unique_ptr<SeparableSmoother> smoother_;
   std::unique_ptr<GradientSums> gradient_sums_;
   std::vector<float> score_rows_;  // the last three rows of scores

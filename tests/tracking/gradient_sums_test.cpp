@@ -89,7 +89,7 @@ TEST(ScoreRowTest, EigenvaluesElongationAndRoundCorners) {
   EXPECT_EQ(scores[1], 10.0f);
 }
 
-TEST(FindMaximaTest, StrictOverAllEightNeighbours) {
+TEST(FindMaximaTest, StrictOverAllEightNeighboursAndNotUnderTheLeast) {
   std::mt19937 random(9);
   for (std::size_t count = 1; count < 60; ++count) {
     std::vector<float> rows[3];
@@ -97,14 +97,15 @@ TEST(FindMaximaTest, StrictOverAllEightNeighbours) {
       for (std::size_t x = 0; x < count; ++x) row.push_back(random() % 12);  // with many ties
     }
     std::vector<std::uint32_t> expected, found;
+    const float least = count % 3 * 4;
     for (std::size_t x = 1; x + 1 < count; ++x) {
       int under = 0;
       for (const auto& row : rows) {
         for (int dx = -1; dx <= 1; ++dx) under += row[x + dx] < rows[1][x];
       }
-      if (under == 8) expected.push_back(x);
+      if (under == 8 && rows[1][x] >= least) expected.push_back(x);
     }
-    FindMaxima(rows[0].data(), rows[1].data(), rows[2].data(), count, found);
+    FindMaxima(rows[0].data(), rows[1].data(), rows[2].data(), count, least, found);
     ASSERT_EQ(found, expected) << count;
   }
 }
