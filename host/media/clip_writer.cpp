@@ -26,7 +26,7 @@ class FfmpegWriter final : public ClipWriter {
   FfmpegWriter(const std::string& path, const ClipInfo& source, int width, int height,
                const EncodeSettings& settings)
       : shown_(path == "-" ? "standard output" : path), to_pipe_(path == "-") {
-    av_log_set_level(AV_LOG_QUIET);
+    ListenToFfmpeg();
     if (width < 1 || height < 1 || std::int64_t{width} * height > kMaximumPixels) {
       Fail("can't hold frames of " + std::to_string(width) + " x " + std::to_string(height) +
            " pixels");

@@ -104,7 +104,17 @@ std::int64_t PromisedFrames(const Decoder& decoder) {
   return promised;
 }
 
-std::string DamageLine(const Decoder& decoder, std::size_t frames) {
+// Of a stream that was decoded to its end. One thread marks every frame in time, and the same in
+// every run.
+int DamageOf(const std::string& path, const Decoder& decoder) {
+  if (!decoder.complained()) return decoder.damage();
+  Decoder alone(path, 1);
+  while (alone.Next()) {
+  }
+  return alone.damage() > 0 ? alone.damage() : decoder.damage();
+}
+
+std::string DamageLine(const std::string& path, const Decoder& decoder, std::size_t frames) {
   const std::int64_t promised = PromisedFrames(decoder);
   const auto count = static_cast<std::int64_t>(frames);
   // Packed streams promise a frame or two more than they hold.
@@ -114,8 +124,8 @@ std::string DamageLine(const Decoder& decoder, std::size_t frames) {
     return "damaged or cut short, " + std::to_string(count) + " of " + std::to_string(promised) +
            " frames decode";
   }
-  if (decoder.damage() > 0) {
-    return "damaged in " + std::to_string(decoder.damage()) + " places, " + std::to_string(count) +
+  if (const int damage = DamageOf(path, decoder); damage > 0) {
+    return "damaged in " + std::to_string(damage) + " places, " + std::to_string(count) +
            " frames decode";
   }
   const AVFormatContext& container = decoder.container();
@@ -215,7 +225,7 @@ FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info,
   }
   info.colour = {first->color_primaries, first->color_trc, first->colorspace, first->color_range,
                  first->chroma_location};
-  const std::string damage = DamageLine(decoder, index.size());
+  const std::string damage = DamageLine(path, decoder, index.size());
   if (!damage.empty()) info.warning = path + ": " + damage;
   return index;
 }
