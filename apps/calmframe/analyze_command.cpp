@@ -31,7 +31,11 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
 void AnalyzeCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
-  const std::unique_ptr<SteadyClip> taken = TakeUp(input_, project_, controls_);
+  RunOnPromises([&](Opening opening) { Analyze(opening, progress); });
+}
+
+void AnalyzeCommand::Analyze(Opening opening, ProgressLine& progress) const {
+  const std::unique_ptr<SteadyClip> taken = TakeUp(input_, project_, controls_, opening);
   SteadyClip& clip = *taken;
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);

@@ -5,6 +5,7 @@
 
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/stabilize_command.h"
+#include "apps/calmframe/steady_clip.h"
 
 namespace calmframe {
 
@@ -17,6 +18,8 @@ class AnalyzeCommand {
   void Run();
 
  private:
+  void Analyze(Opening opening, ProgressLine& progress) const;
+
   CLI::App* const command_;
   std::string input_, project_;
   ControlFlags controls_;

@@ -20,4 +20,7 @@ class SolveFailure : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
+// The clip holds other frames than its container promised: opened anew, it must be decoded first.
+class BrokenPromise : public std::exception {};
+
 }  // namespace calmframe

@@ -15,10 +15,10 @@ void AddProjectFlag(CLI::App& command, std::string& project) {
 }
 
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                   const ControlFlags& controls) {
+                                   const ControlFlags& controls, Opening opening) {
   std::error_code error;
   if (project.empty() || !std::filesystem::exists(project, error)) {
-    return std::make_unique<SteadyClip>(clip, controls);
+    return std::make_unique<SteadyClip>(clip, controls, opening);
   }
   const host::Project saved = host::LoadProject(project);
   if (host::ContentOf(clip) != saved.clip_content) {

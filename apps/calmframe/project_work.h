@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "apps/calmframe/controls.h"
+#include "apps/calmframe/failures.h"
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/steady_clip.h"
 
@@ -14,10 +15,22 @@ namespace calmframe {
 
 void AddProjectFlag(CLI::App& command, std::string& project);
 
-// The clip, with the work that the project keeps of it if there is such a file. Throws
-// media::Failure when that is of another clip.
+// The clip, with the work that the project keeps of it if there is such a file; such a clip may not
+// be read in order, so nothing is taken for promised. Throws media::Failure when the work is of
+// another clip.
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                   const ControlFlags& controls);
+                                   const ControlFlags& controls, Opening opening);
+
+// Calls run(opening): by what the clip's container promises, which spares decoding it once more
+// than its analysis does, and where the frames break that from the start once more.
+template <class Run>
+void RunOnPromises(const Run& run) {
+  try {
+    return run(Opening::promised);
+  } catch (const BrokenPromise&) {
+  }
+  run(Opening::decoded);
+}
 
 // The clip of saved work, found by its name or beside it. Throws media::Failure,
 // host::ProjectFailure.

@@ -116,20 +116,22 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
                const ControlFlags& controls, const OutputFlags& flags, int threads,
                ProgressLine& progress) {
   const tessel::threads::ProcessorLimit limit(threads);
-  const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls);
-  const media::ClipInfo& info = clip->info();
-  if (!info.warning.empty()) progress.Warn(info.warning);
-  KeepApart(output, {project});
-  // Made first, so that an output that cannot be written costs nobody an analysis.
-  const std::unique_ptr<media::ClipWriter> writer =
-      media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
-  const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
-  CheckCrop(*clip, progress);
-  RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
-             progress);
-  writer->Finish();
-  for (const std::string& line : writer->warnings()) progress.Warn(line);
-  unsaved.Throw();
+  RunOnPromises([&](Opening opening) {
+    const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls, opening);
+    const media::ClipInfo& info = clip->info();
+    if (!info.warning.empty()) progress.Warn(info.warning);
+    KeepApart(output, {project});
+    // Made first, so that an output that cannot be written costs nobody an analysis.
+    const std::unique_ptr<media::ClipWriter> writer =
+        media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
+    const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
+    CheckCrop(*clip, progress);
+    RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
+               progress);
+    writer->Finish();
+    for (const std::string& line : writer->warnings()) progress.Warn(line);
+    unsaved.Throw();
+  });
 }
 
 StabilizeCommand::StabilizeCommand(CLI::App& program)

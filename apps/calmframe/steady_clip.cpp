@@ -87,8 +87,7 @@ std::string Reuse::Text() const {
 }
 
 SteadyClip::Medium SteadyClip::Open(const std::string& path,
-                                    const std::vector<std::uint8_t>& found) {
-  std::unique_ptr<media::ClipReader> reader = media::ClipReader::Open(path, found);
+                                    std::unique_ptr<media::ClipReader> reader) {
   const media::ClipInfo info = reader->info();
   if (info.width < kLeastSide || info.height < kLeastSide) {
     throw media::Failure(media::Failure::Side::input, path + ": " + std::to_string(info.width) +
@@ -123,12 +122,16 @@ SteadyClip::Medium SteadyClip::Blank(const host::Project& project) {
   return {info, host::MakeDrawnSource(source, draw), nullptr};
 }
 
-SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls)
-    : SteadyClip(nullptr, Open(path, {}), controls) {}
+SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls, Opening opening)
+    : SteadyClip(nullptr,
+                 Open(path, opening == Opening::promised ? media::ClipReader::OpenPromised(path)
+                                                         : media::ClipReader::Open(path)),
+                 controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const std::string& path,
                        const ControlFlags& controls)
-    : SteadyClip(&project, Open(path, project.clip_frames), controls) {}
+    : SteadyClip(&project, Open(path, media::ClipReader::Open(path, project.clip_frames)),
+                 controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const ControlFlags& controls)
     : SteadyClip(&project, Blank(project), controls) {}
@@ -164,6 +167,7 @@ void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
   Progress shown;
   const auto show = [&] {
     const Work work = host::Session::WorkOf(*effect_);
+    if (IsBroken()) return true;  // in this order: what it ends for that reason is not told
     const std::string stage = work == Work::analysing ? "analyzing"
                               : work == Work::solving ? "solving"
                                                       : "";
@@ -185,6 +189,7 @@ void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
     return InterruptAsked();
   };
   const auto waited = session_.TickUntilSettled(std::chrono::hours(24 * 30), show);
+  if (IsBroken()) throw BrokenPromise();
   if (waited != host::Session::Wait::settled) throw Interrupted();
   show();
   // The render that follows has its own pattern of buffers: what the analysis took goes back.
@@ -208,6 +213,8 @@ Reuse SteadyClip::Work(ProgressLine& progress) {
     if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
     Settle(progress, reuse);
   }
+  // An analysis that ended early has not seen all that was promised.
+  if (found_ && found_->standing() != media::Standing::decoded) throw BrokenPromise();
   reuse.solve = reuse.analysis && warp && warp == FirstWarp();
   reuse.framing = reuse.framing && reuse.solve;
   CheckResult(progress);
@@ -299,6 +306,10 @@ std::string SteadyClip::NameOf(std::int32_t disk_id) const {
 double SteadyClip::ValueOf(std::int32_t disk_id) const {
   const auto param = effect_->Param(effect_->IndexOf(disk_id));
   return param ? host::ValueOf(*param).value_or(0.0) : 0.0;
+}
+
+bool SteadyClip::IsBroken() const {
+  return found_ && found_->standing() == media::Standing::broken;
 }
 
 void SteadyClip::CheckMedia() {

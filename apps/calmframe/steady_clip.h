@@ -29,12 +29,17 @@ struct Reuse {
   std::string Text() const;
 };
 
+// How a clip without saved work is opened: all of it decoded to number its frames; or by what its
+// container promises of them, while the analysis is the first to decode them.
+enum class Opening { decoded, promised };
+
 // A clip on the timeline of a host, with the effect applied to it. For the thread that made it.
 class SteadyClip {
  public:
   // A clip of which nothing is done yet, or the saved work of one, its controls changed where flags
   // say so. Throws media::Failure, UsageFailure, and SolveFailure when the effect can't be had.
-  SteadyClip(const std::string& path, const ControlFlags& controls);
+  SteadyClip(const std::string& path, const ControlFlags& controls,
+             Opening opening = Opening::decoded);
   SteadyClip(const host::Project& project, const std::string& path, const ControlFlags& controls);
   // The saved work of a clip that is gone: what was made of it stands, its frames are blank.
   SteadyClip(const host::Project& project, const ControlFlags& controls);
@@ -47,7 +52,8 @@ class SteadyClip {
 
   // Waits until the effect has analysed and solved the clip, as far as that is to do. Throws
   // Interrupted, SolveFailure, media::Failure; the last also where a clip that is gone would have
-  // to be analysed.
+  // to be analysed; BrokenPromise of a clip that was opened by promises, before anything is told of
+  // how the work ended.
   Reuse Work(ProgressLine& progress);
 
   // Solves once more with the controls as they stand, for what only a running solve tells. Throws
@@ -75,9 +81,10 @@ class SteadyClip {
     host::SourcePtr source;
     std::shared_ptr<const media::FoundFrames> found;  // null: a stand-in for one that is gone
   };
-  static Medium Open(const std::string& path, const std::vector<std::uint8_t>& found);
+  static Medium Open(const std::string& path, std::unique_ptr<media::ClipReader> reader);
   static Medium Blank(const host::Project& project);
   SteadyClip(const host::Project* project, const Medium& medium, const ControlFlags& controls);
+  bool IsBroken() const;
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`.
   void Settle(ProgressLine& progress, Reuse& reuse);
   // Throws SolveFailure where the effect is not ready.

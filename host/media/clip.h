@@ -71,11 +71,18 @@ struct ClipInfo {
   bool operator==(const ClipInfo&) const = default;
 };
 
-// What opening a clip found, to be kept beside work that was made of it. Any thread.
+// What stands behind a reader's info: frames; or still promises of the container; or promises that
+// the frames have broken, after which the reader and those made of it give no frame.
+enum class Standing { decoded, promised, broken };
+
+// What is known of a clip's frames, to be kept beside work that was made of it. Any thread.
 class FoundFrames {
  public:
   virtual ~FoundFrames() = default;
-  // For ClipReader::Open, in this process or another. Some nine bytes a frame.
+  // Changes once at most, from `promised`, before the frame is given that decides it.
+  virtual Standing standing() const = 0;
+  // For ClipReader::Open, in this process or another. Some nine bytes a frame; none unless it
+  // stands decoded.
   virtual std::vector<std::uint8_t> Bytes() const = 0;
 };
 
@@ -87,11 +94,16 @@ class ClipReader {
   // comes from other libraries, counts for nothing. Throws Failure (input).
   static std::unique_ptr<ClipReader> Open(const std::string& path,
                                           const std::vector<std::uint8_t>& found = {});
+  // The same by the promises of its packets: whoever reads all frames in order anyhow, from the
+  // first on, spares decoding them once more, but has to look at how found() stands when it has
+  // read them, and to open the clip anew where the promise is broken. A clip whose promises are not
+  // worth much is decoded all the same.
+  static std::unique_ptr<ClipReader> OpenPromised(const std::string& path);
   virtual ~ClipReader() = default;
 
   // Another reader of the clip, with a place of its own. One of a file doesn't search it again for
-  // its frames. Throws Failure (input).
-  virtual std::unique_ptr<ClipReader> Again() const { return Open(info().path); }
+  // its frames, but decodes first what is still promised. Throws Failure (input).
+  virtual std::unique_ptr<ClipReader> Again() { return Open(info().path); }
 
   virtual const ClipInfo& info() const = 0;
   // Null of a clip that is made, not read.

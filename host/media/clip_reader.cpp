@@ -5,6 +5,7 @@
 #include "host/media/clip.h"
 #include "host/media/decode_ahead.h"
 #include "host/media/decoder.h"
+#include "host/media/first_pass.h"
 #include "host/media/frame_index.h"
 #include "host/media/frame_list.h"
 #include "host/media/pixel_conversion.h"
@@ -18,15 +19,26 @@ constexpr std::size_t kSkippedAtMost = 8;
 class FfmpegReader final : public ClipReader {
  public:
   explicit FfmpegReader(std::shared_ptr<const FrameList> list)
-      : list_(std::move(list)), to_pixels_(info()), finder_(info().path, list_->index) {}
+      : info_(list->info), list_(std::move(list)), to_pixels_(info_) {
+    finder_.emplace(info_.path, list_->index);
+  }
+  explicit FfmpegReader(std::unique_ptr<FirstPass> first_pass)
+      : info_(first_pass->promised()),
+        promised_(first_pass->frames()),
+        to_pixels_(info_),
+        first_pass_(std::move(first_pass)) {}
 
-  std::unique_ptr<ClipReader> Again() const override {
+  std::unique_ptr<ClipReader> Again() override {
+    LeaveFirstPass();
     return std::make_unique<FfmpegReader>(list_);
   }
 
-  const ClipInfo& info() const override { return list_->info; }
-  std::shared_ptr<const FoundFrames> found() const override { return list_; }
-  bool BeginsAsListed() { return finder_.BeginsAs(info()); }
+  const ClipInfo& info() const override { return info_; }
+  std::shared_ptr<const FoundFrames> found() const override {
+    if (promised_) return promised_;
+    return list_;
+  }
+  bool BeginsAsListed() { return finder_->BeginsAs(info_); }
 
   void Read(std::size_t frame, HX_Pixel8* pixels, std::ptrdiff_t row_bytes) override {
     ReadAs(frame, pixels, row_bytes);
@@ -41,8 +53,8 @@ class FfmpegReader final : public ClipReader {
  private:
   template <class Pixel>
   void ReadAs(std::size_t frame, Pixel* pixels, std::ptrdiff_t row_bytes) {
-    if (frame >= info().frame_count) {
-      throw Failure(Failure::Side::input, info().path + ": has no frame " + std::to_string(frame));
+    if (frame >= info_.frame_count) {
+      throw Failure(Failure::Side::input, info_.path + ": has no frame " + std::to_string(frame));
     }
     try {
       Fetch(frame);
@@ -52,7 +64,7 @@ class FfmpegReader final : public ClipReader {
     } catch (const std::bad_alloc&) {
       throw;
     } catch (const std::exception& error) {
-      throw Failure(Failure::Side::input, info().path + ": " + error.what());
+      throw Failure(Failure::Side::input, info_.path + ": " + error.what());
     }
   }
 
@@ -64,26 +76,51 @@ class FfmpegReader final : public ClipReader {
     if (ahead_ && (frame < ahead_->next() || frame > ahead_->next() + kSkippedAtMost)) {
       ahead_.reset();
     }
-    if (!ahead_ && ascending) ahead_.emplace(finder_, frame, info().frame_count);
+    if (!ahead_ && first_pass_ && (frame > 0 || first_pass_->begun())) LeaveFirstPass();
+    if (!ahead_ && ascending) {
+      ahead_.emplace(
+          [this](std::size_t number, const std::atomic<bool>& stop) {
+            return first_pass_ ? first_pass_->Get(number, stop) : finder_->Get(number, stop);
+          },
+          frame, info_.frame_count);
+    }
     if (ahead_) {
       while (ahead_->next() < frame) ahead_->Pop();
       last_ = ahead_->Pop();
     } else {
       const std::atomic<bool> never = false;
-      last_ = finder_.Get(frame, never);
+      last_ = finder_->Get(frame, never);
     }
     last_number_ = frame;
   }
 
-  const std::shared_ptr<const FrameList> list_;
+  void LeaveFirstPass() {
+    if (!first_pass_) return;
+    ahead_.reset();
+    list_ = first_pass_->Complete();
+    first_pass_.reset();
+    finder_.emplace(info_.path, list_->index);
+  }
+
+  const ClipInfo info_;
+  std::shared_ptr<const PromisedFrames> promised_;  // null of a clip that was decoded at once
+  std::shared_ptr<const FrameList> list_;           // null during the first pass
   FrameToPixels to_pixels_;
-  FrameFinder finder_;
+  std::unique_ptr<FirstPass> first_pass_;  // or
+  std::optional<FrameFinder> finder_;
   FramePtr last_;
   std::size_t last_number_ = 0;
-  std::optional<DecodeAhead> ahead_;  // last: it uses the finder until it is gone
+  std::optional<DecodeAhead> ahead_;  // last: it uses one of these until it is gone
 };
 
 }  // namespace
+
+std::unique_ptr<ClipReader> ClipReader::OpenPromised(const std::string& path) {
+  if (auto first_pass = FirstPass::Begin(path)) {
+    return std::make_unique<FfmpegReader>(std::move(first_pass));
+  }
+  return Open(path);
+}
 
 std::unique_ptr<ClipReader> ClipReader::Open(const std::string& path,
                                              const std::vector<std::uint8_t>& found) {

@@ -26,7 +26,7 @@ class FfmpegWriter final : public ClipWriter {
   FfmpegWriter(const std::string& path, const ClipInfo& source, int width, int height,
                const EncodeSettings& settings)
       : shown_(path == "-" ? "standard output" : path), to_pipe_(path == "-") {
-    av_log_set_level(AV_LOG_QUIET);
+    ListenToFfmpeg();
     if (width < 1 || height < 1 || std::int64_t{width} * height > kMaximumPixels) {
       Fail("can't hold frames of " + std::to_string(width) + " x " + std::to_string(height) +
            " pixels");
@@ -67,9 +67,12 @@ class FfmpegWriter final : public ClipWriter {
     AVDictionary* options = nullptr;
     // The source's clock, kept as it is.
     if (std::strcmp(format->name, "mpegts") == 0) av_dict_set(&options, "mpegts_copyts", "1", 0);
-    const int error = avformat_write_header(container, &options);
+    // A pipe can't take back what is said in it: nothing before the first frame.
+    const int error = to_pipe_ ? avformat_init_output(container, &options)
+                               : avformat_write_header(container, &options);
     av_dict_free(&options);
     Check(error);
+    headed_ = !to_pipe_;
   }
 
   void Write(std::size_t frame, const HX_Pixel8* pixels, std::ptrdiff_t row_bytes) override {
@@ -85,6 +88,7 @@ class FfmpegWriter final : public ClipWriter {
   const std::vector<std::string>& warnings() const override { return warnings_; }
 
   void Finish() override {
+    WriteHeader();
     encoder_->Send(0, nullptr);
     WriteEncoded();
     CopyUntil(INT64_MAX);
@@ -104,6 +108,11 @@ class FfmpegWriter final : public ClipWriter {
   }
   void Check(int error) const {
     if (error < 0) Fail("can't be written: " + ErrorText(error));
+  }
+
+  void WriteHeader() {
+    if (std::exchange(headed_, true)) return;
+    Check(avformat_write_header(container_.get(), nullptr));
   }
 
   void CopyFrom(const ClipInfo& source) {
@@ -126,6 +135,7 @@ class FfmpegWriter final : public ClipWriter {
     } catch (const std::exception& error) {
       Fail(error.what());
     }
+    WriteHeader();
     encoder_->Send(frame, std::move(converted));
     // Only as far as the video has come: the muxer holds what it can't interleave yet in memory.
     const FrameTime time = encoder_->TimeOf(frame);
@@ -172,6 +182,7 @@ class FfmpegWriter final : public ClipWriter {
   std::optional<Encoder> encoder_;
   std::optional<PixelsToFrame> to_frame_;
   std::unique_ptr<AVFormatContext, OutputDelete> container_;
+  bool headed_ = false;
   std::optional<StreamCopy> copy_;
   std::optional<std::size_t> last_;
 };

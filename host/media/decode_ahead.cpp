@@ -10,8 +10,8 @@ constexpr std::size_t kFramesAhead = 4;
 
 }  // namespace
 
-DecodeAhead::DecodeAhead(FrameFinder& finder, std::size_t first, std::size_t end)
-    : finder_(finder), end_(end), next_(first), thread_([this, first] { Run(first); }) {}
+DecodeAhead::DecodeAhead(Get get, std::size_t first, std::size_t end)
+    : get_(std::move(get)), end_(end), next_(first), thread_([this, first] { Run(first); }) {}
 
 DecodeAhead::~DecodeAhead() {
   {
@@ -25,7 +25,7 @@ DecodeAhead::~DecodeAhead() {
 void DecodeAhead::Run(std::size_t first) {
   try {
     for (std::size_t frame = first; frame < end_; ++frame) {
-      FramePtr decoded = finder_.Get(frame, stop_);
+      FramePtr decoded = get_(frame, stop_);
       if (!decoded) return;
       std::unique_lock lock(mutex_);
       changed_.wait(lock, [this] { return stop_ || frames_.size() < kFramesAhead; });

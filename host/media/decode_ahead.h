@@ -5,18 +5,22 @@
 #include <cstddef>
 #include <deque>
 #include <exception>
+#include <functional>
 #include <mutex>
 #include <thread>
 
-#include "host/media/frame_index.h"
+#include "host/media/ffmpeg.h"
 
 namespace calmframe::media {
 
-// Decodes frames first, first + 1, ... on a thread of its own until the clip's end, a failure, or
-// its destruction, whichever comes first. The finder belongs to that thread while this lives.
+// Gets frames first, first + 1, ... on a thread of its own until the clip's end, a failure, or its
+// destruction, whichever comes first.
 class DecodeAhead {
  public:
-  DecodeAhead(FrameFinder& finder, std::size_t first, std::size_t end);
+  // A frame by its number; null if `stop` became true.
+  using Get = std::function<FramePtr(std::size_t frame, const std::atomic<bool>& stop)>;
+  // What `get` uses belongs to that thread while this lives.
+  DecodeAhead(Get get, std::size_t first, std::size_t end);
   ~DecodeAhead();  // cancels and waits, for one frame's decoding at most
   DecodeAhead(const DecodeAhead&) = delete;
   DecodeAhead& operator=(const DecodeAhead&) = delete;
@@ -29,7 +33,7 @@ class DecodeAhead {
  private:
   void Run(std::size_t first);
 
-  FrameFinder& finder_;
+  const Get get_;
   const std::size_t end_;
   std::size_t next_;  // the consumer's
   std::atomic<bool> stop_ = false;

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdarg>
 #include <cstring>
 #include <string_view>
 
@@ -30,10 +31,23 @@ namespace {
 // Many damaged packets in a row end the stream: some demuxers return the same error for ever.
 constexpr int kErrorLimit = 1000;
 
+// Of a decoder of ours, on any of its threads: its context, or a copy of it, leads to the count.
+void CountComplaint(void* speaker, int level, const char*, va_list) {
+  if (level > AV_LOG_INFO || !speaker) return;
+  if (*static_cast<const AVClass* const*>(speaker) != avcodec_get_class()) return;
+  void* const count = static_cast<AVCodecContext*>(speaker)->opaque;
+  if (count) ++*static_cast<std::atomic<int>*>(count);
+}
+
 }  // namespace
 
-InputPtr OpenInput(const std::string& path) {
+void ListenToFfmpeg() {
   av_log_set_level(AV_LOG_QUIET);
+  av_log_set_callback(CountComplaint);
+}
+
+InputPtr OpenInput(const std::string& path) {
+  ListenToFfmpeg();
   struct stat status;
   if (stat(path.c_str(), &status) != 0) Fail(path, std::strerror(errno));
   if (S_ISDIR(status.st_mode)) Fail(path, "is a directory");
@@ -55,7 +69,8 @@ InputPtr OpenInput(const std::string& path) {
   return container;
 }
 
-Decoder::Decoder(const std::string& path) : path_(path), packet_(NewPacket()) {
+Decoder::Decoder(const std::string& path, int threads)
+    : path_(path), threads_(threads), packet_(NewPacket()) {
   Open();
 }
 
@@ -90,7 +105,8 @@ void Decoder::Open() {
   codec_.reset(NotNull(avcodec_alloc_context3(decoder)));
   int error = avcodec_parameters_to_context(codec_.get(), &parameters);
   codec_->pkt_timebase = stream_->time_base;
-  codec_->thread_count = 0;
+  codec_->opaque = &complaints_;
+  codec_->thread_count = threads_;
   codec_->thread_type = FF_THREAD_FRAME | FF_THREAD_SLICE;
   codec_->max_pixels = kMaximumPixels;
   if (error >= 0) error = avcodec_open2(codec_.get(), decoder, nullptr);

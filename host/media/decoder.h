@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <string>
 
@@ -14,11 +15,14 @@ constexpr std::int64_t kMaximumPixels = std::int64_t{1} << 27;
 // like or its contents point to. Throws Failure (input).
 InputPtr OpenInput(const std::string& path);
 
+// From now on FFmpeg prints nothing, and its decoders' complaints are counted. Any thread.
+void ListenToFfmpeg();
+
 // Frames of a file's first video stream in the order shown. What is damaged is skipped and counted.
 class Decoder {
  public:
-  // Throws Failure (input).
-  explicit Decoder(const std::string& path);
+  // threads: 0 as many as there are processors. Throws Failure (input).
+  explicit Decoder(const std::string& path, int threads = 0);
 
   // The next frame, null at the end of the stream.
   FramePtr Next();
@@ -30,8 +34,12 @@ class Decoder {
 
   const AVFormatContext& container() const { return *container_; }
   const AVStream& stream() const { return *stream_; }
-  // Packets or frames that were not whole, so far.
+  // Packets or frames that were not whole, so far. With several threads it may miss some: a frame
+  // is handed out while what is missing in it is still being made up, and marked too late.
   int damage() const { return damage_; }
+  // Whether the decoder found anything worth a word, which misses nothing once the stream has
+  // ended.
+  bool complained() const { return complaints_ > 0; }
   // End of the last packet of any stream read so far, in AV_TIME_BASE ticks.
   std::int64_t last_time() const { return last_time_; }
 
@@ -40,6 +48,8 @@ class Decoder {
   bool Feed();
 
   const std::string path_;
+  const int threads_;
+  std::atomic<int> complaints_ = 0;  // counted by all of the codec's threads
   InputPtr container_;
   AVStream* stream_ = nullptr;
   CodecPtr codec_;

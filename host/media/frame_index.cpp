@@ -104,7 +104,17 @@ std::int64_t PromisedFrames(const Decoder& decoder) {
   return promised;
 }
 
-std::string DamageLine(const Decoder& decoder, std::size_t frames) {
+// Of a stream that was decoded to its end. One thread marks every frame in time, and the same in
+// every run.
+int DamageOf(const std::string& path, const Decoder& decoder) {
+  if (!decoder.complained()) return decoder.damage();
+  Decoder alone(path, 1);
+  while (alone.Next()) {
+  }
+  return alone.damage() > 0 ? alone.damage() : decoder.damage();
+}
+
+std::string DamageLine(const std::string& path, const Decoder& decoder, std::size_t frames) {
   const std::int64_t promised = PromisedFrames(decoder);
   const auto count = static_cast<std::int64_t>(frames);
   // Packed streams promise a frame or two more than they hold.
@@ -114,8 +124,8 @@ std::string DamageLine(const Decoder& decoder, std::size_t frames) {
     return "damaged or cut short, " + std::to_string(count) + " of " + std::to_string(promised) +
            " frames decode";
   }
-  if (decoder.damage() > 0) {
-    return "damaged in " + std::to_string(decoder.damage()) + " places, " + std::to_string(count) +
+  if (const int damage = DamageOf(path, decoder); damage > 0) {
+    return "damaged in " + std::to_string(damage) + " places, " + std::to_string(count) +
            " frames decode";
   }
   const AVFormatContext& container = decoder.container();
@@ -160,42 +170,28 @@ std::uint64_t Fingerprint(const AVFrame& frame) {
   return hash;
 }
 
-FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info, std::size_t most) {
-  FrameIndex index;
-  const AVStream& stream = decoder.stream();
-  std::size_t top_first = 0;
-  std::size_t bottom_first = 0;
-  FramePtr first;
-  AVRational aspect{0, 1};
-  while (FramePtr frame = decoder.Next()) {
-    if (index.size() == most) {
-      throw Failure(Failure::Side::input, path + ": more than " + std::to_string(most) + " frames");
-    }
-    index.push_back({OwnTime(*frame), Fingerprint(*frame), frame->key_frame != 0});
-    info.times.push_back({TimeOrNone(frame->best_effort_timestamp),
-                          std::max<std::int64_t>(TimeOrNone(frame->pkt_duration), 0)});
-    if (frame->interlaced_frame) ++(frame->top_field_first ? top_first : bottom_first);
-    if (!first) {
-      aspect = av_guess_sample_aspect_ratio(const_cast<AVFormatContext*>(&decoder.container()),
-                                            const_cast<AVStream*>(&stream), frame.get());
-      first = std::move(frame);
-    }
-  }
-  if (!first) {
-    throw Failure(Failure::Side::input, path + ": no frame of its video stream decodes");
-  }
-  const bool interlaced = 2 * (top_first + bottom_first) > index.size();
-  RepairTimes(stream, interlaced, info.times);
+AVRational PixelAspect(const Decoder& decoder, const AVFrame& first) {
+  return av_guess_sample_aspect_ratio(const_cast<AVFormatContext*>(&decoder.container()),
+                                      const_cast<AVStream*>(&decoder.stream()),
+                                      const_cast<AVFrame*>(&first));
+}
 
+ClipInfo InfoOf(const std::string& path, const Decoder& decoder, std::vector<FrameTime> times,
+                const AVFrame& first, AVRational aspect, const FieldCounts& fields) {
+  const AVStream& stream = decoder.stream();
+  const bool interlaced = 2 * (fields.top_first + fields.bottom_first) > times.size();
+  ClipInfo info;
+  info.times = std::move(times);
+  RepairTimes(stream, interlaced, info.times);
   info.path = path;
   info.stream = stream.index;
-  info.frame_count = index.size();
+  info.frame_count = info.times.size();
   info.time_base = ToRatio(stream.time_base);
   info.frame_rate = ToRatio(FrameRate(stream, info.times));
   info.codec = avcodec_get_name(stream.codecpar->codec_id);
   ReadOrientation(stream, info);
-  info.width = first->width;
-  info.height = first->height;
+  info.width = first.width;
+  info.height = first.height;
   if (aspect.num <= 0 || aspect.den <= 0) aspect = {1, 1};
   if (info.rotation % 180 != 0) {
     std::swap(info.width, info.height);
@@ -203,21 +199,52 @@ FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info,
   } else if (interlaced) {
     // Upside down, an even number of rows puts the lower field's rows on top.
     const bool swapped = info.rotation == 180 && info.height % 2 == 0;
-    info.field_order =
-        (top_first >= bottom_first) != swapped ? FieldOrder::top_first : FieldOrder::bottom_first;
+    info.field_order = (fields.top_first >= fields.bottom_first) != swapped
+                           ? FieldOrder::top_first
+                           : FieldOrder::bottom_first;
   }
   info.pixel_aspect = ToRatio(aspect);
-  const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(static_cast<AVPixelFormat>(first->format));
+  const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(static_cast<AVPixelFormat>(first.format));
   if (layout) {
     info.bit_depth =
         layout->flags & AV_PIX_FMT_FLAG_PAL ? 8 : std::clamp(layout->comp[0].depth, 8, 16);
     info.has_alpha = (layout->flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
   }
-  info.colour = {first->color_primaries, first->color_trc, first->colorspace, first->color_range,
-                 first->chroma_location};
-  const std::string damage = DamageLine(decoder, index.size());
-  if (!damage.empty()) info.warning = path + ": " + damage;
-  return index;
+  info.colour = {first.color_primaries, first.color_trc, first.colorspace, first.color_range,
+                 first.chroma_location};
+  return info;
+}
+
+void FrameScan::Add(const AVFrame& frame) {
+  if (index_.size() == most_) {
+    throw Failure(Failure::Side::input, path_ + ": more than " + std::to_string(most_) + " frames");
+  }
+  index_.push_back({OwnTime(frame), Fingerprint(frame), frame.key_frame != 0});
+  times_.push_back({TimeOrNone(frame.best_effort_timestamp),
+                    std::max<std::int64_t>(TimeOrNone(frame.pkt_duration), 0)});
+  if (frame.interlaced_frame) {
+    ++(frame.top_field_first ? fields_.top_first : fields_.bottom_first);
+  }
+  if (first_) return;
+  aspect_ = PixelAspect(decoder_, frame);
+  first_.reset(NotNull(av_frame_clone(&frame)));
+}
+
+ClipInfo FrameScan::Finish() {
+  if (!first_) {
+    throw Failure(Failure::Side::input, path_ + ": no frame of its video stream decodes");
+  }
+  ClipInfo info = InfoOf(path_, decoder_, std::move(times_), *first_, aspect_, fields_);
+  const std::string damage = DamageLine(path_, decoder_, index_.size());
+  if (!damage.empty()) info.warning = path_ + ": " + damage;
+  return info;
+}
+
+FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info, std::size_t most) {
+  FrameScan scan(path, decoder, most);
+  while (const FramePtr frame = decoder.Next()) scan.Add(*frame);
+  info = scan.Finish();
+  return scan.TakeIndex();
 }
 
 bool FrameFinder::BeginsAs(const ClipInfo& info) {

@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "host/media/decoder.h"
@@ -24,6 +25,44 @@ struct IndexEntry {
   bool keyframe = false;
 };
 using FrameIndex = std::vector<IndexEntry>;
+
+// How many of a clip's frames are interlaced.
+struct FieldCounts {
+  std::size_t top_first = 0, bottom_first = 0;
+};
+
+// Of the pixels of the decoder's first frame; 0 if it isn't known.
+AVRational PixelAspect(const Decoder& decoder, const AVFrame& first);
+
+// What is told of a clip, but for a warning. times: one at least, before any repair. aspect: as
+// PixelAspect told when the first frame came.
+ClipInfo InfoOf(const std::string& path, const Decoder& decoder, std::vector<FrameTime> times,
+                const AVFrame& first, AVRational aspect, const FieldCounts& fields);
+
+// What a pass over a clip's frames, from the first to the last, tells of it.
+class FrameScan {
+ public:
+  // `decoder` is the one that gives the frames; it outlives this.
+  FrameScan(const std::string& path, const Decoder& decoder, std::size_t most = kMaximumFrames)
+      : path_(path), decoder_(decoder), most_(most) {}
+
+  // Throws Failure (input) where there are too many.
+  void Add(const AVFrame& frame);
+  // After the decoder's end: the info, with a warning where the stream is damaged. Throws Failure
+  // (input) if there was no frame.
+  ClipInfo Finish();
+  FrameIndex TakeIndex() { return std::move(index_); }
+
+ private:
+  const std::string path_;
+  const Decoder& decoder_;
+  const std::size_t most_;
+  FrameIndex index_;
+  std::vector<FrameTime> times_;
+  FieldCounts fields_;
+  FramePtr first_;
+  AVRational aspect_{0, 1};
+};
 
 // Decodes everything once: a container's own count and times are promises, this is what is there.
 // Fills info, with a warning where the stream is damaged. Throws Failure (input) if no frame

@@ -16,6 +16,7 @@ struct FrameList final : FoundFrames {
   ClipInfo info;
   FrameIndex index;  // one a frame
 
+  Standing standing() const override { return Standing::decoded; }
   std::vector<std::uint8_t> Bytes() const override;
 };
 

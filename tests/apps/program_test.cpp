@@ -237,6 +237,31 @@ TEST_F(ProgramTest, ADamagedClipIsToldOfInEveryRun) {
   EXPECT_EQ(Run(work + "--smoothness 10 > c.y4m").text, first);
 }
 
+// Damage that only decoding tells, which the analysis is the first to do: whoever watches sees one
+// run, and the pipe gets one stream.
+TEST_F(ProgramTest, DamageThatTheAnalysisMeetsIsToldAsIfItHadBeenSeenBefore) {
+  MakeClip("in.mp4", 320, 240, 60);
+  std::string bytes = Content("in.mp4");
+  bytes.replace(bytes.find("mdat") + (bytes.size() / 3), 40, 40, 'x');
+  MakeFile("in.mp4", bytes);
+  const auto count = [](const std::string& text, const std::string& part) {
+    std::size_t found = 0;
+    for (std::size_t at = 0; (at = text.find(part, at)) != std::string::npos; ++at) ++found;
+    return found;
+  };
+  const Outcome outcome = Run("stabilize in.mp4 - > out.y4m");
+  EXPECT_EQ(outcome.code, 0) << outcome.text;
+  EXPECT_EQ(count(outcome.text, "in.mp4: damaged in "), 1u) << outcome.text;
+  EXPECT_EQ(count(outcome.text, "analyzing    0 %"), 1u) << outcome.text;
+  EXPECT_EQ(count(outcome.text, "analyzing  100 %"), 1u) << outcome.text;
+  const std::string y4m = Content("out.y4m");
+  EXPECT_EQ(count(y4m, "YUV4MPEG2"), 1u);
+  EXPECT_EQ(count(y4m, "FRAME\n"), 60u);
+  EXPECT_EQ(Run("stabilize in.mp4 out.mp4 --quiet").code, 0);
+  EXPECT_EQ(ClipReader::Open(Path("out.mp4"))->info().frame_count, 60u);
+  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "out.mp4", "out.y4m"));
+}
+
 TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
   MakeClip("in.mp4", 320, 240, 90);
   const pid_t child = fork();
