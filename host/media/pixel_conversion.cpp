@@ -6,6 +6,8 @@
 #include <thread>
 #include <type_traits>
 
+#include "host/media/pixel_planes.h"
+
 namespace calmframe::media {
 namespace {
 
@@ -168,16 +170,9 @@ void FromComponents(const AVFrame& frame, bool full_range, Pixel* pixels,
 void FromPlanes8(const AVFrame& gbr, bool alpha, HX_Pixel8* pixels, std::ptrdiff_t row_bytes) {
   for (int y = 0; y < gbr.height; ++y) {
     const auto plane = [&](int p) { return gbr.data[p] + std::ptrdiff_t{y} * gbr.linesize[p]; };
-    const std::uint8_t* green = plane(0);
-    const std::uint8_t* blue = plane(1);
-    const std::uint8_t* red = plane(2);
-    HX_Pixel8* out = Row(pixels, row_bytes, y);
-    if (alpha) {
-      const std::uint8_t* opacity = plane(3);
-      for (int x = 0; x < gbr.width; ++x) out[x] = {opacity[x], red[x], green[x], blue[x]};
-    } else {
-      for (int x = 0; x < gbr.width; ++x) out[x] = {255, red[x], green[x], blue[x]};
-    }
+    PackPixels({alpha ? plane(3) : nullptr, plane(2), plane(0), plane(1)},
+               static_cast<std::size_t>(gbr.width),
+               reinterpret_cast<std::uint8_t*>(Row(pixels, row_bytes, y)));
   }
 }
 

@@ -5,6 +5,8 @@
 #include <string>
 #include <type_traits>
 
+#include "host/media/pixel_planes.h"
+
 namespace calmframe::media {
 namespace {
 
@@ -19,13 +21,6 @@ bool Aligned(const AVFrame& frame) {
     }
   }
   return true;
-}
-
-// A pixel as it lies in memory, where the compiler sees a vector of whole pixels.
-std::uint32_t Packed(std::uint32_t alpha, std::uint32_t red, std::uint32_t green,
-                     std::uint32_t blue) {
-  static_assert(std::endian::native == std::endian::little);
-  return alpha | red << 8 | green << 16 | blue << 24;
 }
 
 // One part of a picture in the host's pixels and the ring of rows that zimg works on beside it.
@@ -46,45 +41,17 @@ struct Rows {
 
 int PackRow(void* user, unsigned row, unsigned left, unsigned right) {
   const auto& rows = *static_cast<const Rows<std::uint8_t>*>(user);
-  const std::uint8_t* red = rows.Plane(0, row);
-  const std::uint8_t* green = rows.Plane(1, row);
-  const std::uint8_t* blue = rows.Plane(2, row);
-  auto* out = reinterpret_cast<std::uint32_t*>(rows.Pixels(row));
-  if (rows.alpha) {
-    const std::uint8_t* alpha = rows.Plane(3, row);
-    for (unsigned x = left; x < right; ++x) {
-      out[x] = Packed(alpha[x], red[x], green[x], blue[x]);
-    }
-  } else {
-    for (unsigned x = left; x < right; ++x) out[x] = Packed(255, red[x], green[x], blue[x]);
-  }
+  const auto plane = [&](int p) { return rows.Plane(p, row) + left; };
+  PackPixels({rows.alpha ? plane(3) : nullptr, plane(0), plane(1), plane(2)}, right - left,
+             rows.Pixels(row) + 4 * std::size_t{left});
   return 0;
 }
 
 int UnpackRow(void* user, unsigned row, unsigned left, unsigned right) {
   const auto& rows = *static_cast<const Rows<const std::uint8_t>*>(user);
-  std::uint8_t* red = rows.Plane(0, row);
-  std::uint8_t* green = rows.Plane(1, row);
-  std::uint8_t* blue = rows.Plane(2, row);
-  const auto* in = reinterpret_cast<const std::uint32_t*>(rows.Pixels(row));
-  std::uint32_t every_alpha = 255;
-  for (unsigned x = left; x < right; ++x) {
-    const std::uint32_t pixel = in[x];
-    every_alpha &= pixel;
-    red[x] = static_cast<std::uint8_t>(pixel >> 8);
-    green[x] = static_cast<std::uint8_t>(pixel >> 16);
-    blue[x] = static_cast<std::uint8_t>(pixel >> 24);
-  }
-  if (rows.alpha) {
-    std::uint8_t* alpha = rows.Plane(3, row);
-    for (unsigned x = left; x < right; ++x) alpha[x] = static_cast<std::uint8_t>(in[x]);
-  } else if (every_alpha != 255) {
-    for (std::uint8_t* plane : {red, green, blue}) {
-      for (unsigned x = left; x < right; ++x) {
-        plane[x] = static_cast<std::uint8_t>((plane[x] * (in[x] & 255) + 127) / 255);
-      }
-    }
-  }
+  const auto plane = [&](int p) { return rows.Plane(p, row) + left; };
+  UnpackPixels(rows.Pixels(row) + 4 * std::size_t{left}, right - left,
+               {rows.alpha ? plane(3) : nullptr, plane(0), plane(1), plane(2)});
   return 0;
 }
 
