@@ -44,16 +44,19 @@ bool ColorPyramidFromArgb(const ArgbFrame& frame, ImagePyramid& pyramid,
     return opaque;
   }
   const std::size_t samples = frame.width * kChannels;
-  scratch.resize(std::max(scratch.size(), samples));
   bool opaque = true;
   for (std::size_t y = 0; y < frame.height; ++y) {
     const ArgbFrame line{frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes,
                          frame.row_bytes, frame.width, 1};
     std::uint8_t* row = pyramid.bytes.data() + y * samples;
     if (!ColorAndLumaFromArgb(line, row, luma + y * frame.width)) opaque = false;
-    if (y % 2 != 0 || deepest == 0) continue;
-    FloatsFromBytes(row, samples, scratch.data());
-    ReduceOnwards(pyramid, 0, y, scratch.data());
+    const std::size_t reduced_y = y / 2;
+    if (y % 2 != 0 || deepest == 0 || reduced_y == 0 || reduced_y + 1 >= pyramid.LevelHeight(1)) {
+      continue;
+    }
+    float* reduced = pyramid.LevelData(1) + reduced_y * pyramid.LevelWidth(1) * kChannels;
+    ReducedColorFromArgb(line.top_row, frame.width, reduced);
+    ReduceOnwards(pyramid, 1, reduced_y, reduced);
   }
   for (std::size_t l = 1; l < pyramid.levels; ++l) {
     const std::size_t row = pyramid.LevelWidth(l) * kChannels;

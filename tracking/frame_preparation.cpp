@@ -167,6 +167,47 @@ bool ColorAndLumaRows(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t*
   return ColorBytes<true>(frame, color, luma);
 }
 
+// (before + 2 centre + after) / 4 of every other pixel. Two colours are summed in a lane, 16 bits
+// each, of which a sum takes 10.
+void ReducedColorRow(const std::uint8_t* row, std::size_t width, float* destination) {
+  const std::size_t end = (width + 1) / 2 - 1;
+  std::fill_n(destination, 3, 0.0f);
+  std::size_t j = 1;
+#if HWY_TARGET != HWY_SCALAR
+  const Pixels d;
+  const Floats df;
+  const std::size_t N = hn::Lanes(d);
+  const auto low_bytes = hn::Set(d, 0x00FF00FF);
+  const auto quarter = hn::Set(df, 0.25f);
+  const auto average = [&](auto sum) HWY_ATTR { return hn::Mul(hn::ConvertTo(df, sum), quarter); };
+  for (; j + N <= end && 2 * (j + N) < width; j += N) {
+    const std::uint8_t* first = row + 4 * (2 * j - 1);
+    const auto left = LoadPixels(first, 0);
+    const auto right = LoadPixels(first, N);
+    const auto before = hn::ConcatEven(d, right, left);
+    const auto centre = hn::ConcatOdd(d, right, left);
+    const auto after = hn::ConcatEven(d, LoadPixels(first, N + 2), LoadPixels(first, 2));
+    const auto sum = [&](auto part) HWY_ATTR {
+      const auto c = part(centre);
+      return hn::Add(hn::Add(part(before), part(after)), hn::Add(c, c));
+    };
+    const auto green = sum([&](auto v) HWY_ATTR { return hn::And(v, low_bytes); });
+    const auto red_blue =
+        sum([&](auto v) HWY_ATTR { return hn::And(hn::ShiftRight<8>(v), low_bytes); });
+    hn::StoreInterleaved3(average(hn::And(red_blue, hn::Set(d, 0xFFFF))),
+                          average(hn::ShiftRight<16>(green)), average(hn::ShiftRight<16>(red_blue)),
+                          df, destination + 3 * j);
+  }
+#endif
+  for (; j < end; ++j) {
+    for (std::size_t c = 0; c < 3; ++c) {
+      const std::uint8_t* centre = row + 8 * j + 1 + c;
+      destination[3 * j + c] = static_cast<float>(centre[-4] + 2 * centre[0] + centre[4]) * 0.25f;
+    }
+  }
+  std::fill_n(destination + 3 * end, 3, 0.0f);
+}
+
 void WidenBytes(const std::uint8_t* bytes, std::size_t count, float* floats) {
   const Floats d;
   const Pixels di;
@@ -191,6 +232,7 @@ HWY_EXPORT(MaskRows);
 HWY_EXPORT(ColorRows);
 HWY_EXPORT(ColorByteRows);
 HWY_EXPORT(ColorAndLumaRows);
+HWY_EXPORT(ReducedColorRow);
 HWY_EXPORT(WidenBytes);
 
 void LumaFromArgb(const ArgbFrame& frame, std::uint8_t* luma) {
@@ -211,6 +253,10 @@ void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color) {
 
 bool ColorAndLumaFromArgb(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {
   return HWY_DYNAMIC_DISPATCH(ColorAndLumaRows)(frame, color, luma);
+}
+
+void ReducedColorFromArgb(const std::uint8_t* row, std::size_t width, float* destination) {
+  HWY_DYNAMIC_DISPATCH(ReducedColorRow)(row, width, destination);
 }
 
 void FloatsFromBytes(const std::uint8_t* bytes, std::size_t count, float* floats) {

@@ -29,6 +29,10 @@ void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color);
 // Colour and luma in one walk. True if the whole mask would be 1.
 bool ColorAndLumaFromArgb(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma);
 
+// A row of the colours' next pyramid level from the frame's row over it, which has `width` pixels,
+// at least 3: what ReduceRow makes of ColorFromArgb's row, to the bit.
+void ReducedColorFromArgb(const std::uint8_t* row, std::size_t width, float* destination);
+
 void FloatsFromBytes(const std::uint8_t* bytes, std::size_t count, float* floats);
 
 }  // namespace marrow::tracking

@@ -203,7 +203,7 @@ HWY_INLINE void SamplePixel(const T* in, std::size_t stride, float fx, float fy,
 
 // Where N neighbouring pixels of a row come from: the four samples about each start at offset[j].
 struct PixelPlaces {
-  HWY_ALIGN std::int32_t offset[17];
+  HWY_ALIGN std::int32_t offset[16];
   HWY_ALIGN float fx[16];
   HWY_ALIGN float fy[16];
   std::uint32_t jumps = 0;  // bit j: pixel j + 1 is not read right beside pixel j
@@ -239,7 +239,10 @@ HWY_INLINE void SampleAffineRows(const T* image, std::size_t image_width,
   HWY_ALIGN std::int32_t pixel_of[16 * C];
   for (std::size_t i = 0; i < C * N; ++i) pixel_of[i] = static_cast<std::int32_t>(i / C);
   PixelPlaces places;
-  places.offset[N] = 0;
+  HWY_ALIGN std::int32_t next_lane[16];  // the last one has none, and none is asked for
+  for (std::size_t j = 0; j < N; ++j)
+    next_lane[j] = static_cast<std::int32_t>(std::min(j + 1, N - 1));
+  const auto next = hn::SetTableIndices(di, next_lane);
   const auto half_x = static_cast<float>(shape.half_x);
   for (std::size_t row = 0; row < shape.rows(); ++row) {
     const float v = static_cast<float>(row) - static_cast<float>(shape.half_y);
@@ -263,7 +266,7 @@ HWY_INLINE void SampleAffineRows(const T* image, std::size_t image_width,
       if constexpr (!kWide) {
         SamplePixels<C, kWide>(origin, stride, places, 0, count, out);
       } else {
-        const auto jump = hn::Ne(hn::Sub(hn::LoadU(di, places.offset + 1), offset), pixel_step);
+        const auto jump = hn::Ne(hn::Sub(hn::TableLookupLanes(offset, next), offset), pixel_step);
         std::uint8_t bits[8] = {};
         hn::StoreMaskBits(di, jump, bits);
         places.jumps = bits[0] | static_cast<std::uint32_t>(bits[1]) << 8;

@@ -5,10 +5,12 @@
 #include <random>
 #include <vector>
 
+#include "tests/support/each_instruction_set.h"
+
 namespace marrow::tracking {
 namespace {
 
-// Sizes with a level too small for a filter, and with odd sides.
+// Sizes with a level too small for a filter, and with odd sides; each instruction set.
 TEST(ColorPyramidTest, EqualsConversionAndLevelsApart) {
   std::mt19937 random(3);
   for (const auto& [w, h] :
@@ -21,20 +23,23 @@ TEST(ColorPyramidTest, EqualsConversionAndLevelsApart) {
                           -static_cast<std::ptrdiff_t>(row_bytes), std::size_t(w), std::size_t(h)};
     for (const std::size_t levels : {1, 3, 5}) {
       ImagePyramid expected(w, h, 3, levels);
-      ImagePyramid pyramid(w, h, 3, levels, ImagePyramid::first_level::bytes);
-      // What a frame before may have left.
-      std::fill(pyramid.data.begin(), pyramid.data.end(), 7.0f);
       std::fill(expected.data.begin(), expected.data.end(), 7.0f);
-      std::vector<float> scratch;
-      std::vector<std::uint8_t> luma(w * h), expected_luma(w * h);
       ColorFromArgb(frame, expected.LevelData(0));
       BuildLevels(expected);
-      ColorPyramidFromArgb(frame, pyramid, scratch, luma.data());
+      std::vector<std::uint8_t> expected_luma(w * h);
       LumaFromArgb(frame, expected_luma.data());
-      ASSERT_EQ(luma, expected_luma);
-      std::vector<float> found(pyramid.bytes.begin(), pyramid.bytes.end());
-      found.insert(found.end(), pyramid.data.begin(), pyramid.data.end());
-      ASSERT_TRUE(found == expected.data) << w << "x" << h << ", " << levels;
+      tests::OnEachInstructionSet([&, w = w, h = h] {
+        ImagePyramid pyramid(w, h, 3, levels, ImagePyramid::first_level::bytes);
+        // What a frame before may have left.
+        std::fill(pyramid.data.begin(), pyramid.data.end(), 7.0f);
+        std::vector<float> scratch;
+        std::vector<std::uint8_t> luma(w * h);
+        ColorPyramidFromArgb(frame, pyramid, scratch, luma.data());
+        ASSERT_EQ(luma, expected_luma);
+        std::vector<float> found(pyramid.bytes.begin(), pyramid.bytes.end());
+        found.insert(found.end(), pyramid.data.begin(), pyramid.data.end());
+        ASSERT_TRUE(found == expected.data) << w << "x" << h << ", " << levels;
+      });
     }
   }
 }

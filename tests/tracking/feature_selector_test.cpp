@@ -1,7 +1,6 @@
 #include "tracking/feature_selector.h"
 
 #include <gmock/gmock.h>
-#include <hwy/highway.h>
 
 #include <algorithm>
 #include <cmath>
@@ -10,6 +9,8 @@
 #include <sstream>
 #include <string>
 #include <vector>
+
+#include "tests/support/each_instruction_set.h"
 
 namespace marrow::tracking {
 namespace {
@@ -199,14 +200,7 @@ TEST(FeatureSelectorCandidates, TheSameBitsOnEveryInstructionSet) {
   const Image image = RandomImage(150, 110, 77);
   const auto expected = PlainCandidates(params, image);
   ASSERT_FALSE(expected.empty());
-  const std::int64_t supported = hwy::SupportedTargets() & HWY_TARGETS;
-  for (std::int64_t left = supported; left != 0; left &= left - 1) {
-    hwy::SetSupportedTargetsForTest(left & -left);
-    hwy::GetChosenTarget().Update(left & -left);
-    EXPECT_EQ(Texts(Candidates(params, image)), expected) << hwy::TargetName(left & -left);
-  }
-  hwy::SetSupportedTargetsForTest(0);
-  hwy::GetChosenTarget().Update(hwy::SupportedTargets());
+  tests::OnEachInstructionSet([&] { EXPECT_EQ(Texts(Candidates(params, image)), expected); });
 }
 
 TEST(FeatureSelectorCandidates, FlatTransparentStraightAndTinyFramesHaveNone) {

@@ -1,29 +1,16 @@
 #include "tracking/window_kernels.h"
 
 #include <gtest/gtest.h>
-#include <hwy/highway.h>
 
 #include <cmath>
 #include <limits>
 #include <random>
 #include <vector>
 
+#include "tests/support/each_instruction_set.h"
+
 namespace marrow::tracking {
 namespace {
-
-// Runs `check` with every instruction set that this processor has.
-template <class Check>
-void OnEachInstructionSet(Check check) {
-  const std::int64_t supported = hwy::SupportedTargets() & HWY_TARGETS;
-  for (std::int64_t left = supported; left != 0; left &= left - 1) {
-    hwy::SetSupportedTargetsForTest(left & -left);
-    hwy::GetChosenTarget().Update(left & -left);
-    SCOPED_TRACE(hwy::TargetName(left & -left));
-    check();
-  }
-  hwy::SetSupportedTargetsForTest(0);
-  hwy::GetChosenTarget().Update(hwy::SupportedTargets());
-}
 
 // Windows of one to many vectors, with rests of every kind.
 template <class Check>
@@ -94,7 +81,7 @@ struct PlainImage {
 };
 
 TEST(WindowKernelsTest, TranslatedSamplesReachTheImagesLastPixel) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     std::mt19937 random(1);
     ForEachShape([&](const window_shape& shape) {
       const PlainImage image(shape.columns() + 4, shape.rows() + 3, shape.channels, random);
@@ -122,7 +109,7 @@ TEST(WindowKernelsTest, TranslatedSamplesReachTheImagesLastPixel) {
 }
 
 TEST(WindowKernelsTest, GradientsAreWholeCentralDifferences) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     std::mt19937 random(2);
     ForEachShape([&](const window_shape& shape) {
       const std::size_t w = shape.columns() + 2, n = shape.samples();
@@ -145,7 +132,7 @@ TEST(WindowKernelsTest, GradientsAreWholeCentralDifferences) {
 }
 
 TEST(WindowKernelsTest, AffineSamplesInTheMiddleAndOnTheLastRow) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     std::mt19937 random(3);
     ForEachShape([&](const window_shape& shape) {
       const auto half_x = static_cast<float>(shape.half_x);
@@ -183,7 +170,7 @@ TEST(WindowKernelsTest, AffineSamplesInTheMiddleAndOnTheLastRow) {
 }
 
 TEST(WindowKernelsTest, AWindowIsInsideWhenEveryCornerIs) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     const window_shape shape{2, 1, 3};
     const auto inside = [&](float x, float y, float m01 = 0.0f, float m10 = 0.0f) {
       const auto fx = x - std::floor(x), fy = y - std::floor(y);
@@ -218,7 +205,7 @@ TEST(WindowKernelsTest, AWindowIsInsideWhenEveryCornerIs) {
 }
 
 TEST(WindowKernelsTest, SumsEqualPlainLoops) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     std::mt19937 random(4);
     ForEachShape([&](const window_shape& shape) {
       const Plane t(shape, random), gx(shape, random), gy(shape, random), u(shape, random),
@@ -298,7 +285,7 @@ TEST(WindowKernelsTest, SumsEqualPlainLoops) {
 }
 
 TEST(WindowKernelsTest, MomentsAreAboutTheMeanAndExactlyNothingForAFlatChannel) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     std::mt19937 random(5);
     ForEachShape([&](const window_shape& shape) {
       const std::size_t channels = shape.channels;
