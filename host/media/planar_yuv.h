@@ -5,10 +5,12 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <vector>
 
 #include "host/media/colour_model.h"
 #include "host/media/ffmpeg.h"
+#include "host/media/yuv420.h"
 #include "platform/hx/hx_pixel.h"
 
 namespace calmframe::media {
@@ -50,10 +52,13 @@ class PlanarYuv {
   void Process(const AVFrame& frame, const ColourModel& model, Byte* pixels,
                std::ptrdiff_t row_bytes);
   std::uint8_t* Memory(std::size_t bytes);
+  // Null where the frame is zimg's.
+  Yuv420* Own(const AVFrame& frame, const ColourModel& model);
 
   Graph graphs_[3];  // whole frame, top field, bottom field
   std::vector<std::uint8_t> memory_;
   FramePtr aligned_;
+  std::optional<Yuv420> own_;
 };
 
 }  // namespace calmframe::media
