@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
+#include <tuple>
 
 using marrow::stabilization::matrix3;
 using marrow::stabilization::point2;
@@ -86,13 +87,18 @@ struct StripRenderer<Pixel>::cell {
   bool border;
 };
 
-// A band's runs that are not drawn yet, and which pixels have been given some.
+// A row's runs that are not drawn yet, and which pixels of a band have been given some.
 template <class Pixel>
 struct StripRenderer<Pixel>::band_runs {
   struct span {
     int y;
     int x0;
     int x1;
+  };
+  struct run_of_cell {
+    const cell* q;
+    std::int64_t x0;
+    int count;
   };
 
   // Joins what follows right on.
@@ -104,7 +110,7 @@ struct StripRenderer<Pixel>::band_runs {
     }
   }
 
-  std::array<source_run<Pixel>, 128> runs;
+  std::array<run_of_cell, 128> runs;
   std::size_t count = 0;
   std::vector<span> spans;
 };
@@ -229,8 +235,7 @@ void StripRenderer<Pixel>::drawGridRow(std::int32_t r, std::int64_t first_row, s
     for (const cell& q : cells) {
       if (y >= q.y0 && y < q.y1) drawRow(q, y, runs);
     }
-    SampleRuns(source_, runs.runs.data(), runs.count);
-    runs.count = 0;
+    sample(y, runs);
   }
 }
 
@@ -289,8 +294,7 @@ bool StripRenderer<Pixel>::setUpCell(std::int32_t c, std::int32_t r, std::int64_
 
 template <class Pixel>
 void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, band_runs& runs) const {
-  const double py = (static_cast<double>(y) + offset_y_) / zoom_;
-  if (!(py < renderer_.planeHeight)) return;
+  if (!(plane_y(y) < renderer_.planeHeight)) return;
   const double test_y = static_cast<double>(y) / zoom_;
   const double* test_x = test_x_.data() + to_destination_x_;
 
@@ -301,7 +305,7 @@ void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, band_runs& run
   q.edges[2].cutSeldom(zoom_, test_x, test_y, inside0, inside1);
   q.edges[3].cut(zoom_, test_x, test_y, inside0, inside1);
   if (!q.border) {
-    drawSpan(q, inside0, inside1, y, py, runs);
+    drawSpan(q, inside0, inside1, y, runs);
     return;
   }
   // A border cell also takes what lies near an outer edge that it owns.
@@ -316,41 +320,53 @@ void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, band_runs& run
   for (std::int64_t x = q.x0; x < q.x1; ++x) {
     if (x == inside0) x = inside1;
     if (x < q.x1 && near(x)) continue;
-    drawSpan(q, begin, std::min(x, q.x1), y, py, runs);
+    drawSpan(q, begin, std::min(x, q.x1), y, runs);
     begin = x + 1;
   }
-  drawSpan(q, begin, q.x1, y, py, runs);
+  drawSpan(q, begin, q.x1, y, runs);
 }
 
 template <class Pixel>
 void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, std::int64_t y,
-                                    double py, band_runs& runs) const {
+                                    band_runs& runs) const {
   const double* plane_x = plane_x_.data() + to_destination_x_;
   while (x0 < x1 && !(plane_x[x1 - 1] < renderer_.planeWidth)) --x1;
   if (x0 >= x1) return;
-  const int row_of_span = static_cast<int>(y + to_destination_y_);
-  Pixel* row = destination_.row(row_of_span);
-  runs.Add(row_of_span, static_cast<int>(x0 + to_destination_x_),
+  runs.Add(static_cast<int>(y + to_destination_y_), static_cast<int>(x0 + to_destination_x_),
            static_cast<int>(x1 + to_destination_x_));
-  const matrix3& h = q.square_from_plane;
   for (std::int64_t x = x0; x < x1; x += max_run) {
+    runs.runs[runs.count++] = {&q, x, static_cast<int>(std::min<std::int64_t>(max_run, x1 - x))};
+    if (runs.count == runs.runs.size()) sample(y, runs);
+  }
+}
+
+// All of a row's runs at once: their divisions don't wait for each other, nor for the search of
+// spans, whose branches are hard to foretell.
+template <class Pixel>
+void StripRenderer<Pixel>::sample(std::int64_t y, band_runs& runs) const {
+  const double py = plane_y(y);
+  const double* plane_x = plane_x_.data() + to_destination_x_;
+  Pixel* row = destination_.row(static_cast<int>(y + to_destination_y_)) + to_destination_x_;
+  std::array<source_run<Pixel>, std::tuple_size_v<decltype(runs.runs)>> placed;
+  for (std::size_t i = 0; i < runs.count; ++i) {
+    const auto& [q, x, count] = runs.runs[i];
+    const matrix3& h = q->square_from_plane;
     const double px = plane_x[x];
     const double inverse_w = 1.0 / (h[6] * px + h[7] * py + h[8]);
     const double u = (h[0] * px + h[1] * py + h[2]) * inverse_w;
     const double v = (h[3] * px + h[4] * py + h[5]) * inverse_w;
     // u(x + k) - u(x) = k (h0 - u h6) / zoom / (w + k h6 / zoom), and v likewise.
     const double step = inverse_w / zoom_;
-    runs.runs[runs.count++] = {(q.c + u) * renderer_.cellWidth - 0.5,
-                               (q.r + v) * renderer_.cellHeight - 0.5,
-                               (h[0] - u * h[6]) * step * renderer_.cellWidth,
-                               (h[3] - v * h[6]) * step * renderer_.cellHeight,
-                               h[6] * step,
-                               static_cast<int>(std::min<std::int64_t>(max_run, x1 - x)),
-                               row + (x + to_destination_x_)};
-    if (runs.count < runs.runs.size()) continue;
-    SampleRuns(source_, runs.runs.data(), runs.count);
-    runs.count = 0;
+    placed[i] = {(q->c + u) * renderer_.cellWidth - 0.5,
+                 (q->r + v) * renderer_.cellHeight - 0.5,
+                 (h[0] - u * h[6]) * step * renderer_.cellWidth,
+                 (h[3] - v * h[6]) * step * renderer_.cellHeight,
+                 h[6] * step,
+                 count,
+                 row + x};
   }
+  SampleRuns(source_, placed.data(), runs.count);
+  runs.count = 0;
 }
 
 template class StripRenderer<HX_Pixel8>;

@@ -37,8 +37,10 @@ class StripRenderer : FrameMesh {
   bool setUpCell(std::int32_t c, std::int32_t r, std::int64_t first_row, std::int64_t end_row,
                  cell& q) const;
   void drawRow(const cell& q, std::int64_t y, band_runs& runs) const;
-  void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, std::int64_t y, double py,
+  void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, std::int64_t y,
                 band_runs& runs) const;
+  void sample(std::int64_t y, band_runs& runs) const;
+  double plane_y(std::int64_t y) const { return (static_cast<double>(y) + offset_y_) / zoom_; }
 
   WorldX<Pixel>& destination_;
   const TileMap* only_;
