@@ -17,7 +17,7 @@
 #include "tracking/color_pyramid.h"
 #include "tracking/feature_selector.h"
 #include "tracking/feature_tracker.h"
-#include "tracking/frame_preparation.h"
+#include "tracking/frame_images.h"
 #include "tracking/image_pyramid.h"
 #include "tracking/tracking_run.h"
 
@@ -87,10 +87,8 @@ const Frames& Input() {
     mallopt(M_TRIM_THRESHOLD, std::numeric_limits<int>::max());
     const char* path = std::getenv("CALMFRAME_BENCH_CLIP");
     Frames made = path ? ClipFrames(path) : StreetFrames();
-    std::vector<float> luma(made.width * made.height);
     for (std::size_t f = 0; f < made.pixels.size(); ++f) {
-      LumaFromArgb(made.Argb(f), luma.data());
-      cv::Mat(made.Mat(f).size(), CV_32F, luma.data()).convertTo(made.grey.emplace_back(), CV_8U);
+      LumaFromArgb(made.Argb(f), made.grey.emplace_back(made.Mat(f).size(), CV_8U).data);
     }
     return made;
   }();
@@ -128,7 +126,7 @@ class MemorySource final : public FrameSource {
   std::size_t width() const override { return Input().width; }
   std::size_t height() const override { return Input().height; }
   std::size_t frame_count() const override { return kRun; }
-  void LoadLuma(std::size_t t, float* out) override { images_.Luma(t, Frame(t), out); }
+  void LoadLuma(std::size_t t, std::uint8_t* out) override { images_.Luma(t, Frame(t), out); }
   void LoadMask(std::size_t t, std::uint8_t* out) override { images_.Mask(t, Frame(t), out); }
   void LoadColor(std::size_t t, float* out) override { ColorFromArgb(Frame(t), out); }
   ImagePyramid::first_level first_level() const override {
@@ -136,13 +134,13 @@ class MemorySource final : public FrameSource {
   }
   void LoadColorPyramid(std::size_t t, ImagePyramid& pyramid,
                         std::vector<float>& scratch) override {
-    ColorPyramidFromArgb(Frame(t), pyramid, scratch);
+    images_.ColorPyramid(t, Frame(t), pyramid, scratch);
   }
 
  private:
   static ArgbFrame Frame(std::size_t t) { return Input().Argb(FrameOfRun(t)); }
 
-  SelectorImages images_;
+  FrameImages images_;
 };
 
 void SelectCandidates(std::size_t frame, FeatureSelector& selector) {
@@ -174,10 +172,10 @@ void OpticalFlow(const cv::Mat& from, const cv::Mat& to, const TrackerParams& pa
 template <int kPeerDepth>
 void Preparation(benchmark::State& state) {
   const Frames& in = Input();
-  std::vector<float> luma(in.width * in.height), scratch;
-  std::vector<std::uint8_t> mask(in.width * in.height);
+  std::vector<float> scratch;
+  std::vector<std::uint8_t> luma(in.width * in.height), mask(in.width * in.height);
   ImagePyramid pyramid(in.width, in.height, 3, kLevels, ImagePyramid::first_level::bytes);
-  SelectorImages images;
+  FrameImages images;
   cv::Mat rgb, colour, single;
   in.grey[0].convertTo(single, kPeerDepth);
   std::vector<cv::Mat> levels;
@@ -187,7 +185,7 @@ void Preparation(benchmark::State& state) {
       state, 1.5, 1,
       [&] {
         const ArgbFrame argb = in.Argb(frame());
-        ColorPyramidFromArgb(argb, pyramid, scratch);
+        images.ColorPyramid(f, argb, pyramid, scratch);
         images.Luma(f, argb, luma.data());
         images.Mask(f, argb, mask.data());
       },
@@ -204,13 +202,11 @@ void Selector(benchmark::State& state) {
   FeatureSelector selector(params);
   selector.Configure(in.width, in.height);
   MaskFromArgb(in.Argb(0), selector.mask());
-  std::vector<float> luma(in.width * in.height);
-  LumaFromArgb(in.Argb(0), luma.data());
+  LumaFromArgb(in.Argb(0), selector.luma());
   std::vector<cv::Point2f> corners;
   Compare(
       state, 0.5, 1,
       [&] {
-        std::copy(luma.begin(), luma.end(), selector.luma());  // smoothed in place
         selector.ComputeCandidates();
         selector.SelectFirst();
       },
@@ -232,10 +228,11 @@ struct Step {
       if (seed.status > 0) points.emplace_back(seed.x, seed.y);
     }
     std::vector<float> scratch;
+    std::vector<std::uint8_t> luma(in.width * in.height);
     for (std::size_t f = 0; f < 2; ++f) {
       pyramids.emplace_back(in.width, in.height, std::size_t{3}, kLevels,
                             ImagePyramid::first_level::bytes);
-      ColorPyramidFromArgb(in.Argb(f), pyramids[f], scratch);
+      ColorPyramidFromArgb(in.Argb(f), pyramids[f], scratch, luma.data());
     }
     statistics.translation.resize(kLevels + 1);
     statistics.verification.resize(kLevels + 1);

@@ -25,7 +25,7 @@ SelectorParams Params(const benchmark::State& state) {
 }
 
 // Blocks of random brightness with sensor noise, softened by about a pixel as a lens would.
-std::vector<float> Scene(std::size_t width, std::size_t height) {
+std::vector<std::uint8_t> Scene(std::size_t width, std::size_t height) {
   std::mt19937 random(1);
   cv::Mat image(height, width, CV_32F, cv::Scalar(100));
   for (std::size_t i = 0; i < width * height / 600; ++i) {
@@ -34,9 +34,14 @@ std::vector<float> Scene(std::size_t width, std::size_t height) {
     cv::rectangle(image, cv::Rect(corner, size), cv::Scalar(random() % 256), cv::FILLED);
   }
   cv::GaussianBlur(image, image, cv::Size(5, 5), 1.0);
-  std::vector<float> luma(image.begin<float>(), image.end<float>());
-  for (float& v : luma) v = std::min(255.0f, std::floor(v) + static_cast<float>(random() % 4));
+  std::vector<std::uint8_t> luma(image.begin<float>(), image.end<float>());
+  for (auto& v : luma) v = std::min<unsigned>(255, v + random() % 4);
   return luma;
+}
+
+std::vector<float> FloatScene(std::size_t width, std::size_t height) {
+  const std::vector<std::uint8_t> scene = Scene(width, height);
+  return {scene.begin(), scene.end()};
 }
 
 struct Selector {
@@ -44,17 +49,15 @@ struct Selector {
       : scene(Scene(state.range(0), state.range(1))), selector(Params(state)) {
     selector.Configure(state.range(0), state.range(1));
     std::fill_n(selector.mask(), scene.size(), std::uint8_t{1});
-    Reload();
+    std::copy(scene.begin(), scene.end(), selector.luma());
   }
-  void Reload() { std::copy(scene.begin(), scene.end(), selector.luma()); }
-  std::vector<float> scene;
+  std::vector<std::uint8_t> scene;
   FeatureSelector selector;
 };
 
 void WholeSelector(benchmark::State& state) {
   Selector s(state);
   for (auto _ : state) {
-    s.Reload();
     s.selector.ComputeCandidates();
     s.selector.SelectFirst();
   }
@@ -71,16 +74,19 @@ void SelectionOnly(benchmark::State& state) {
 void Presmoothing(benchmark::State& state) {
   const SelectorParams params = Params(state);
   const std::size_t w = state.range(0), h = state.range(1);
-  std::vector<float> image = Scene(w, h);
-  SeparableSmoother smoother(IntegratedGaussian((2.0 * params.half_winx + 1) * 0.1), w);
-  for (auto _ : state) smoother.Smooth(image.data(), w, {0, 0, w, h});
+  const std::vector<std::uint8_t> image = Scene(w, h);
+  SeparableSmoother smoother(IntegratedGaussian((2.0 * params.half_winx + 1) * 0.1), w, 24);
+  for (auto _ : state) {
+    smoother.Start(image.data(), w, {0, 0, w, h});
+    for (std::size_t y = 0; y < h; ++y) benchmark::DoNotOptimize(smoother.Row(y));
+  }
 }
 
 void PresmoothingOpenCv(benchmark::State& state) {
   cv::setNumThreads(1);
   const SelectorParams params = Params(state);
-  std::vector<float> luma = Scene(state.range(0), state.range(1));
-  cv::Mat image(state.range(1), state.range(0), CV_32F, luma.data());
+  const std::vector<float> luma = FloatScene(state.range(0), state.range(1));
+  cv::Mat image(state.range(1), state.range(0), CV_32F, const_cast<float*>(luma.data()));
   const std::vector<float> kernel = IntegratedGaussian((2.0 * params.half_winx + 1) * 0.1);
   cv::Mat out;
   for (auto _ : state) {
@@ -93,19 +99,20 @@ template <int kStages>
 void RowStages(benchmark::State& state) {
   const SelectorParams params = Params(state);
   const std::size_t w = state.range(0), h = state.range(1), inset = params.half_winx + 1;
-  const std::vector<float> image = Scene(w, h);
+  const std::vector<float> image = FloatScene(w, h);
   GradientSums sums(params.half_winx, params.half_winy, w);
   const std::size_t columns = w - 2 * inset;
   std::vector<float> scores(3 * columns);
   std::vector<std::uint32_t> maxima;
   for (auto _ : state) {
-    sums.Start(image.data(), w, {inset, inset, w - inset, h - inset});
+    sums.Start([&](std::size_t y) { return image.data() + y * w; },
+               {inset, inset, w - inset, h - inset});
     maxima.clear();
     for (std::size_t y = 0; y < h - 2 * inset; ++y) {
       const auto row = [&](std::size_t r) { return &scores[r % 3 * columns]; };
       const gradient_sum_row sum = sums.NextRow();
       if (kStages > 1) ScoreRow(sum, columns, params.eig_ratio_threshold, row(y));
-      if (kStages > 2 && y > 1) FindMaxima(row(y - 2), row(y - 1), row(y), columns, maxima);
+      if (kStages > 2 && y > 1) FindMaxima(row(y - 2), row(y - 1), row(y), columns, 441.0f, maxima);
       benchmark::ClobberMemory();
     }
   }
@@ -115,7 +122,7 @@ void RowStages(benchmark::State& state) {
 void PlainSumsAndScores(benchmark::State& state) {
   const SelectorParams params = Params(state);
   const std::size_t w = state.range(0), h = state.range(1), half = params.half_winx;
-  const std::vector<float> image = Scene(w, h);
+  const std::vector<float> image = FloatScene(w, h);
   std::vector<float> planes[3], score(w * h), line(w * h);
   for (auto& plane : planes) plane.resize(w * h);
   for (auto _ : state) {
@@ -163,8 +170,8 @@ template <bool kSmooth>
 void GoodFeaturesToTrackOpenCv(benchmark::State& state) {
   cv::setNumThreads(1);
   const SelectorParams params = Params(state);
-  std::vector<float> luma = Scene(state.range(0), state.range(1));
-  const cv::Mat image(state.range(1), state.range(0), CV_32F, luma.data());
+  const std::vector<float> luma = FloatScene(state.range(0), state.range(1));
+  const cv::Mat image(state.range(1), state.range(0), CV_32F, const_cast<float*>(luma.data()));
   const std::vector<float> kernel = IntegratedGaussian((2.0 * params.half_winx + 1) * 0.1);
   cv::Mat bytes, smooth;
   image.convertTo(bytes, CV_8U);

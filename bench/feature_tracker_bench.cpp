@@ -63,7 +63,7 @@ struct Clip {
     selector.Configure(width, height);
     cv::Mat grey;
     cv::cvtColor(first, grey, cv::COLOR_RGB2GRAY);
-    grey.convertTo(cv::Mat(grey.size(), CV_32F, selector.luma()), CV_32F);
+    grey.convertTo(cv::Mat(grey.size(), CV_8U, selector.luma()), CV_8U);
     std::fill_n(selector.mask(), width * height, std::uint8_t{1});
     selector.ComputeCandidates();
     selector.SelectFirst();

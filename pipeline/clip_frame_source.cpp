@@ -1,7 +1,5 @@
 #include "pipeline/clip_frame_source.h"
 
-#include "tracking/color_pyramid.h"
-
 namespace calmframe::pipeline {
 
 ClipFrameSource::ClipFrameSource(media::ClipReader& reader, boost::function<void(std::size_t)> poll)
@@ -24,7 +22,7 @@ marrow::tracking::ArgbFrame ClipFrameSource::Fetch(std::size_t picture) {
   return {&world.data()->alpha, world.row_bytes(), width(), height()};
 }
 
-void ClipFrameSource::LoadLuma(std::size_t picture, float* destination) {
+void ClipFrameSource::LoadLuma(std::size_t picture, std::uint8_t* destination) {
   images_.Luma(picture, Fetch(picture), destination);
 }
 
@@ -38,7 +36,7 @@ void ClipFrameSource::LoadColor(std::size_t picture, float* destination) {
 
 void ClipFrameSource::LoadColorPyramid(std::size_t picture, marrow::tracking::ImagePyramid& pyramid,
                                        std::vector<float>& scratch) {
-  ColorPyramidFromArgb(Fetch(picture), pyramid, scratch);
+  images_.ColorPyramid(picture, Fetch(picture), pyramid, scratch);
 }
 
 }  // namespace calmframe::pipeline

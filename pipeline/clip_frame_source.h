@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "pipeline/pictures.h"
-#include "tracking/frame_preparation.h"
+#include "tracking/frame_images.h"
 #include "tracking/frame_source.h"
 
 namespace calmframe::pipeline {
@@ -19,7 +19,7 @@ class ClipFrameSource final : public marrow::tracking::FrameSource {
   std::size_t width() const override;
   std::size_t height() const override;
   std::size_t frame_count() const override;
-  void LoadLuma(std::size_t picture, float* destination) override;
+  void LoadLuma(std::size_t picture, std::uint8_t* destination) override;
   void LoadMask(std::size_t picture, std::uint8_t* destination) override;
   void LoadColor(std::size_t picture, float* destination) override;
   marrow::tracking::ImagePyramid::first_level first_level() const override {
@@ -33,7 +33,7 @@ class ClipFrameSource final : public marrow::tracking::FrameSource {
 
   const media::ClipInfo& info_;
   PictureReader<HX_Pixel8> reader_;
-  marrow::tracking::SelectorImages images_;
+  marrow::tracking::FrameImages images_;
   const boost::function<void(std::size_t)> poll_;
   std::size_t polled_ = static_cast<std::size_t>(-1);  // the last picture that poll_ heard of
 };

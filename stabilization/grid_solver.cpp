@@ -1,9 +1,6 @@
 #include "stabilization/grid_solver.h"
 
 #include <algorithm>
-#include <cmath>
-
-#include "platform/lapack/lapack.h"
 
 namespace marrow::stabilization {
 namespace {
@@ -12,21 +9,12 @@ constexpr double kSmoothness = 200.0;
 
 }  // namespace
 
-triangle_shape shape_of_triangle(point2 p0, point2 p1, point2 p2) {
-  const point2 a = {p0.x - p1.x, p0.y - p1.y};
-  const point2 b = {p2.x - p1.x, p2.y - p1.y};
-  const double square = b.x * b.x + b.y * b.y;
-  return {(a.x * b.x + a.y * b.y) / square, (a.x * b.y - a.y * b.x) / square};
-}
-
 grid_solver::grid_solver(std::int32_t cols, std::int32_t rows)
     : cols_(cols),
       rows_(rows),
-      half_bandwidth_(2 * std::min(cols, rows) + 3),
       matrix_(static_cast<std::size_t>(cols) * static_cast<std::size_t>(rows)),
       right_(2 * matrix_.size()),
-      band_(right_.size() * static_cast<std::size_t>(half_bandwidth_ + 1)),
-      solution_(right_.size()) {}
+      system_(matrix_.size(), static_cast<std::size_t>(std::min(cols, rows)) + 1) {}
 
 std::size_t grid_solver::order(std::size_t vertex) const {
   return cols_ <= rows_ ? vertex : vertex % cols_ * rows_ + vertex / cols_;
@@ -38,26 +26,11 @@ bool grid_solver::solve(std::span<const Displacement> list, std::span<const doub
   std::fill(right_.begin(), right_.end(), 0.0);
   add_data(list, data_weight);
   add_shape(shape);
-  fill_band();
+  fill_system();
+  if (!system_.solve()) return false;
   for (std::size_t v = 0; v < matrix_.size(); ++v) {
-    solution_[2 * order(v)] = right_[2 * v];
-    solution_[2 * order(v) + 1] = right_[2 * v + 1];
-  }
-
-  const int n = static_cast<int>(right_.size()), leading = half_bandwidth_ + 1, one = 1;
-  int info = 0;
-  lapack::dpbtrf("L", &n, &half_bandwidth_, band_.data(), &leading, &info);
-  if (info != 0) return false;
-  for (int j = 0; j < n; ++j) {  // the factorization's own test lets NaN through
-    const double pivot = band_[static_cast<std::size_t>(j) * leading];
-    if (!(pivot > 0) || !std::isfinite(pivot)) return false;
-  }
-  lapack::dpbtrs("L", &n, &half_bandwidth_, &one, band_.data(), &leading, solution_.data(), &n,
-                 &info);
-  if (info != 0) return false;
-  for (std::size_t v = 0; v < matrix_.size(); ++v) {
-    solution[2 * v] = solution_[2 * order(v)];
-    solution[2 * v + 1] = solution_[2 * order(v) + 1];
+    solution[2 * v] = system_.solution_re(order(v));
+    solution[2 * v + 1] = system_.solution_im(order(v));
   }
   return true;
 }
@@ -135,31 +108,27 @@ void grid_solver::add_shape(std::span<const double> shape) {
   }
 }
 
-void grid_solver::fill_band() {
-  std::fill(band_.begin(), band_.end(), 0.0);
-  const std::size_t leading = static_cast<std::size_t>(half_bandwidth_) + 1;
-  const auto entry = [&](std::size_t i, std::size_t j) -> double& {
-    return band_[leading * j + i - j];
-  };
+void grid_solver::fill_system() {
+  system_.clear();
   for (std::int32_t r = 0; r < rows_; ++r) {
     for (std::int32_t c = 0; c < cols_; ++c) {
       const std::size_t v = static_cast<std::size_t>(r) * cols_ + c;
       const vertex_row& m = matrix_[v];
-      const std::size_t here = 2 * order(v);
-      entry(here, here) = m.self;
-      entry(here + 1, here + 1) = m.self;
+      const std::size_t here = order(v);
+      system_.set_right(here, right_[2 * v], right_[2 * v + 1]);
+      system_.set(here, here, m.self, 0);
       const bool below = r + 1 < rows_;
       const bool inside[4] = {c + 1 < cols_, below && c > 0, below, below && c + 1 < cols_};
       const std::size_t other[4] = {v + 1, v + cols_ - 1, v + cols_, v + cols_ + 1};
       for (int k = 0; k < 4; ++k) {
         if (!inside[k]) continue;
-        const std::size_t there = 2 * order(other[k]);
-        // The lower triangle holds the block transposed where `there` comes later.
-        const std::size_t i = std::max(here, there), j = std::min(here, there);
-        const double im = there > here ? m.im[k] : -m.im[k];
-        entry(i, j) = entry(i + 1, j + 1) = m.re[k];
-        entry(i, j + 1) = im;
-        entry(i + 1, j) = -im;
+        // The lower triangle holds the conjugate where the other vertex comes later.
+        const std::size_t there = order(other[k]);
+        if (there > here) {
+          system_.set(there, here, m.re[k], -m.im[k]);
+        } else {
+          system_.set(here, there, m.re[k], m.im[k]);
+        }
       }
     }
   }

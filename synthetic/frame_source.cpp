@@ -24,7 +24,7 @@ marrow::tracking::ArgbFrame scene_frame_source::fetch(std::size_t frame_index) {
           static_cast<std::ptrdiff_t>(width() * sizeof(HX_Pixel8)), width(), height()};
 }
 
-void scene_frame_source::LoadLuma(std::size_t frame_index, float* destination) {
+void scene_frame_source::LoadLuma(std::size_t frame_index, std::uint8_t* destination) {
   marrow::tracking::LumaFromArgb(fetch(frame_index), destination);
 }
 

@@ -19,7 +19,7 @@ class scene_frame_source final : public marrow::tracking::FrameSource {
   std::size_t width() const override;
   std::size_t height() const override;
   std::size_t frame_count() const override;
-  void LoadLuma(std::size_t frame_index, float* destination) override;
+  void LoadLuma(std::size_t frame_index, std::uint8_t* destination) override;
   void LoadMask(std::size_t frame_index, std::uint8_t* destination) override;
   void LoadColor(std::size_t frame_index, float* destination) override;
 

@@ -35,21 +35,22 @@ void ReduceWholeLevels(ImagePyramid& pyramid, std::vector<float>& scratch) {
 
 }  // namespace
 
-void ColorPyramidFromArgb(const ArgbFrame& frame, ImagePyramid& pyramid,
-                          std::vector<float>& scratch) {
+bool ColorPyramidFromArgb(const ArgbFrame& frame, ImagePyramid& pyramid,
+                          std::vector<float>& scratch, std::uint8_t* luma) {
   const std::size_t deepest = std::max<std::size_t>(pyramid.levels, 1) - 1;
   if (pyramid.LevelWidth(deepest) < 3 || pyramid.LevelHeight(deepest) < 3) {
-    ColorFromArgb(frame, pyramid.bytes.data());
+    const bool opaque = ColorAndLumaFromArgb(frame, pyramid.bytes.data(), luma);
     ReduceWholeLevels(pyramid, scratch);
-    return;
+    return opaque;
   }
   const std::size_t samples = frame.width * kChannels;
   scratch.resize(std::max(scratch.size(), samples));
+  bool opaque = true;
   for (std::size_t y = 0; y < frame.height; ++y) {
     const ArgbFrame line{frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes,
                          frame.row_bytes, frame.width, 1};
     std::uint8_t* row = pyramid.bytes.data() + y * samples;
-    ColorFromArgb(line, row);
+    if (!ColorAndLumaFromArgb(line, row, luma + y * frame.width)) opaque = false;
     if (y % 2 != 0 || deepest == 0) continue;
     FloatsFromBytes(row, samples, scratch.data());
     ReduceOnwards(pyramid, 0, y, scratch.data());
@@ -59,6 +60,7 @@ void ColorPyramidFromArgb(const ArgbFrame& frame, ImagePyramid& pyramid,
     std::fill_n(pyramid.LevelData(l), row, 0.0f);
     std::fill_n(pyramid.LevelData(l) + (pyramid.LevelHeight(l) - 1) * row, row, 0.0f);
   }
+  return opaque;
 }
 
 }  // namespace marrow::tracking

@@ -49,17 +49,22 @@ void ScoreRowKernel(const gradient_sum_row& sums, std::size_t count, float eig_r
 }
 
 void FindMaximaKernel(const float* above, const float* row, const float* below, std::size_t count,
-                      std::vector<std::uint32_t>& columns) {
+                      float least, std::vector<std::uint32_t>& columns) {
   const hn::ScalableTag<float> d;
   const std::size_t N = hn::Lanes(d);
+  const auto floor = hn::Set(d, least);
   std::size_t x = 1;
   for (; x + N < count; x += N) {
+    const auto scores = hn::LoadU(d, row + x);
+    const auto too_low = hn::Lt(scores, floor);
+    if (hn::AllTrue(d, too_low)) continue;  // flat surfaces and straight edges
     const auto side = [&](const float* p) HWY_ATTR {
       return hn::Max(hn::LoadU(d, p + x - 1), hn::LoadU(d, p + x + 1));
     };
     const auto vertical = hn::Max(hn::LoadU(d, above + x), hn::LoadU(d, below + x));
     const auto sides = hn::Max(hn::Max(side(above), side(below)), side(row));
-    const auto is_maximum = hn::Gt(hn::LoadU(d, row + x), hn::Max(vertical, sides));
+    const auto is_maximum = hn::AndNot(too_low, hn::Gt(scores, hn::Max(vertical, sides)));
+    if (hn::AllFalse(d, is_maximum)) continue;
     std::uint8_t bits[8] = {};
     hn::StoreMaskBits(d, is_maximum, bits);
     std::uint64_t lanes = 0;
@@ -72,7 +77,7 @@ void FindMaximaKernel(const float* above, const float* row, const float* below, 
   for (; x + 1 < count; ++x) {
     const float best = std::max({above[x - 1], above[x], above[x + 1], row[x - 1], row[x + 1],
                                  below[x - 1], below[x], below[x + 1]});
-    if (row[x] > best) columns.push_back(static_cast<std::uint32_t>(x));
+    if (row[x] > best && !(row[x] < least)) columns.push_back(static_cast<std::uint32_t>(x));
   }
 }
 
@@ -92,8 +97,8 @@ void ScoreRow(const gradient_sum_row& sums, std::size_t count, float eig_ratio_t
 }
 
 void FindMaxima(const float* above, const float* row, const float* below, std::size_t count,
-                std::vector<std::uint32_t>& columns) {
-  HWY_DYNAMIC_DISPATCH(FindMaximaKernel)(above, row, below, count, columns);
+                float least, std::vector<std::uint32_t>& columns) {
+  HWY_DYNAMIC_DISPATCH(FindMaximaKernel)(above, row, below, count, least, columns);
 }
 
 }  // namespace marrow::tracking

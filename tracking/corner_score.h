@@ -15,8 +15,8 @@ void ScoreRow(const gradient_sum_row& sums, std::size_t count, float eig_ratio_t
               float* scores);
 
 // Appends to `columns`, ascending, the x from 1 to count - 2 at which `row` is strictly above its 8
-// neighbours. Each row has `count` scores.
+// neighbours and not under `least`. Each row has `count` scores.
 void FindMaxima(const float* above, const float* row, const float* below, std::size_t count,
-                std::vector<std::uint32_t>& columns);
+                float least, std::vector<std::uint32_t>& columns);
 
 }  // namespace marrow::tracking

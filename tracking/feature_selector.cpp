@@ -41,7 +41,7 @@ void FeatureSelector::Configure(std::size_t width, std::size_t height) {
   spacing_ = std::min<std::uint64_t>(params_.spacing, width + height);
   memory::ResizeOnLargePages(luma_, width * height);
   memory::ResizeOnLargePages(mask_, width * height);
-  memory::ResizeOnLargePages(available_, width * height);
+  memory::ResizeOnLargePages(covered_, width * height);
 
   // Gradients are taken on the image inset by the border less the window and 2 pixels of margin;
   // scores where the window, and one pixel more, fits into that.
@@ -56,36 +56,42 @@ void FeatureSelector::Configure(std::size_t width, std::size_t height) {
   gradient_sums_ = std::make_unique<GradientSums>(params_.half_winx, params_.half_winy, width);
   score_rows_.resize(3 * (scoring_region_.x1 - scoring_region_.x0));
   maxima_.reserve(width);
+  std::vector<float> kernel = {1.0f};
   if (params_.presmoothing && params_.presmooth_factor > 0.0f) {
     const std::uint64_t longer = std::max(params_.half_winx, params_.half_winy);
     const double sigma = std::min(static_cast<double>(2 * longer + 1) * params_.presmooth_factor,
                                   static_cast<double>(std::max(width, height)));
-    std::vector<float> kernel = IntegratedGaussian(sigma);
-    const std::uint64_t radius = kernel.size() / 2;
-    smoothing_region_ =
-        Inset(width, height, AtLeastZero(gradient_x, radius), AtLeastZero(gradient_y, radius));
-    smoother_ = std::make_unique<SeparableSmoother>(std::move(kernel), width);
+    kernel = IntegratedGaussian(sigma);
   }
+  const std::uint64_t radius = kernel.size() / 2;
+  smoothing_region_ =
+      Inset(width, height, AtLeastZero(gradient_x, radius), AtLeastZero(gradient_y, radius));
+  smoother_ =
+      std::make_unique<SeparableSmoother>(std::move(kernel), width, gradient_sums_->kept_rows());
 }
 
 FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
   candidates.clear();
   const PixelRegion& region = scoring_region_;
   if (region.empty()) return {};
-  if (smoother_) smoother_->Smooth(luma_.data(), width_, smoothing_region_);
-
   // A score's neighbours all lie in the scoring region, whose outermost pixels are never
   // candidates. Three rows of scores are kept, so each is still in the cache when it is compared.
   const std::size_t columns = region.x1 - region.x0;
+  const float area = static_cast<float>((2 * params_.half_winx + 1) * (2 * params_.half_winy + 1));
+  const float floor = params_.min_eig * area;  // what is under it is dropped, whatever is best
   const auto score_row = [&](std::size_t y) { return score_rows_.data() + y % 3 * columns; };
   float best = -100000.0f;
-  gradient_sums_->Start(luma_.data(), width_, region);
+  smoother_->Start(luma_.data(), width_, smoothing_region_);
+  const PixelRegion& smooth = smoothing_region_;
+  gradient_sums_->Start(
+      [this](std::size_t y) { return smoother_->Row(y); },
+      {region.x0 - smooth.x0, region.y0 - smooth.y0, region.x1 - smooth.x0, region.y1 - smooth.y0});
   for (std::size_t y = region.y0; y < region.y1; ++y) {
     ScoreRow(gradient_sums_->NextRow(), columns, params_.eig_ratio_threshold, score_row(y));
     if (y < region.y0 + 2) continue;
     const float* scores = score_row(y - 1);
     maxima_.clear();
-    FindMaxima(score_row(y - 2), scores, score_row(y), columns, maxima_);
+    FindMaxima(score_row(y - 2), scores, score_row(y), columns, floor, maxima_);
     for (const std::uint32_t x : maxima_) {
       const std::size_t pixel = (y - 1) * width_ + region.x0 + x;
       if (mask_[pixel] == 0) continue;
@@ -98,9 +104,8 @@ FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
     return {};
   }
 
-  const float area = static_cast<float>((2 * params_.half_winx + 1) * (2 * params_.half_winy + 1));
   const float cap = std::min(best, params_.max_eig * area);
-  const float limit = std::max(params_.threshold * cap, params_.min_eig * area);
+  const float limit = std::max(params_.threshold * cap, floor);
   std::erase_if(candidates, [limit](const Candidate& c) { return c.score < limit; });
   if (candidates.empty()) return {};
   std::sort(candidates.begin(), candidates.end(), [](const Candidate& a, const Candidate& b) {
@@ -115,28 +120,32 @@ void FeatureSelector::SelectFirst() {
 
 void FeatureSelector::SelectAvoiding(const tracking_feature<float>* live_features,
                                      std::size_t count, std::size_t limit) {
-  std::fill(available_.begin(), available_.end(), std::uint8_t{1});
+  limit = static_cast<std::size_t>(std::min<std::uint64_t>(limit, params_.max_count));
+  selected.clear();
+  if (limit == 0) return;
+  if (++covered_mark_ == 0) {
+    std::fill(covered_.begin(), covered_.end(), std::uint8_t{0});
+    covered_mark_ = 1;
+  }
   for (std::size_t s = 0; s < count; ++s) {
     const auto& cell = live_features[s];
-    if (cell.status >= 0) ClearDiscAroundFeature(cell.x, cell.y);
+    if (cell.status >= 0) CoverDiscAroundFeature(cell.x, cell.y);
   }
-  Select(static_cast<std::size_t>(std::min<std::uint64_t>(limit, params_.max_count)));
+  Select(limit);
 }
 
 void FeatureSelector::Select(std::size_t limit) {
-  selected.clear();
   for (const Candidate& candidate : candidates) {
-    if (selected.size() >= limit) return;
-    if (available_[candidate.pixel] == 0) continue;
+    if (covered_[candidate.pixel] == covered_mark_) continue;
     const std::size_t column = candidate.pixel % width_;
     const std::size_t row = candidate.pixel / width_;
     selected.push_back({static_cast<float>(column), static_cast<float>(row), candidate.score});
     if (selected.size() == limit) return;
-    ClearDiscAroundCandidate(static_cast<std::int64_t>(column), static_cast<std::int64_t>(row));
+    CoverDiscAroundCandidate(static_cast<std::int64_t>(column), static_cast<std::int64_t>(row));
   }
 }
 
-void FeatureSelector::ClearDiscAroundFeature(float x, float y) {
+void FeatureSelector::CoverDiscAroundFeature(float x, float y) {
   if (!std::isfinite(x) || !std::isfinite(y)) return;
   const float radius = static_cast<float>(spacing_);
   // Clamped before the cast: a tracked position may lie anywhere.
@@ -150,11 +159,11 @@ void FeatureSelector::ClearDiscAroundFeature(float x, float y) {
     const float first = std::max(std::ceil(x - chord), 0.0f);
     const float last = std::min(std::floor(x + chord), static_cast<float>(width_) - 1.0f);
     if (!(first <= last)) continue;
-    ClearSpan(row, static_cast<std::int64_t>(first), static_cast<std::int64_t>(last));
+    CoverSpan(row, static_cast<std::int64_t>(first), static_cast<std::int64_t>(last));
   }
 }
 
-void FeatureSelector::ClearDiscAroundCandidate(std::int64_t column, std::int64_t row) {
+void FeatureSelector::CoverDiscAroundCandidate(std::int64_t column, std::int64_t row) {
   const auto radius = static_cast<std::int64_t>(spacing_);
   const std::int64_t first_row = std::max<std::int64_t>(row - radius, 0);
   const std::int64_t last_row = std::min(row + radius, static_cast<std::int64_t>(height_) - 1);
@@ -162,16 +171,15 @@ void FeatureSelector::ClearDiscAroundCandidate(std::int64_t column, std::int64_t
     const std::int64_t dy = y - row;
     const auto chord =
         static_cast<std::int64_t>(std::sqrt(static_cast<double>(radius * radius - dy * dy)));
-    ClearSpan(y, std::max<std::int64_t>(column - chord, 0),
+    CoverSpan(y, std::max<std::int64_t>(column - chord, 0),
               std::min(column + chord, static_cast<std::int64_t>(width_) - 1));
   }
 }
 
 // Columns first to last, both included.
-void FeatureSelector::ClearSpan(std::int64_t row, std::int64_t first, std::int64_t last) {
-  std::fill(available_.begin() + row * static_cast<std::int64_t>(width_) + first,
-            available_.begin() + row * static_cast<std::int64_t>(width_) + last + 1,
-            std::uint8_t{0});
+void FeatureSelector::CoverSpan(std::int64_t row, std::int64_t first, std::int64_t last) {
+  std::uint8_t* pixels = covered_.data() + row * static_cast<std::int64_t>(width_);
+  std::fill(pixels + first, pixels + last + 1, covered_mark_);
 }
 
 }  // namespace marrow::tracking

@@ -39,8 +39,8 @@ class FeatureSelector {
   std::size_t width() const { return width_; }
   std::size_t height() const { return height_; }
 
-  // Where the frame goes, width * height each. ComputeCandidates smooths the luma in place.
-  float* luma() { return luma_.data(); }         // 0 to 255
+  // Where the frame goes, width * height each.
+  std::uint8_t* luma() { return luma_.data(); }
   std::uint8_t* mask() { return mask_.data(); }  // 0 where no feature may be selected
 
   // Fills `candidates`, by falling score (equal scores by position), and returns the first and the
@@ -58,9 +58,9 @@ class FeatureSelector {
   std::vector<Feature> selected;
 
  private:
-  void ClearDiscAroundFeature(float x, float y);
-  void ClearDiscAroundCandidate(std::int64_t column, std::int64_t row);
-  void ClearSpan(std::int64_t row, std::int64_t first, std::int64_t last);
+  void CoverDiscAroundFeature(float x, float y);
+  void CoverDiscAroundCandidate(std::int64_t column, std::int64_t row);
+  void CoverSpan(std::int64_t row, std::int64_t first, std::int64_t last);
   void Select(std::size_t limit);
 
   SelectorParams params_;
@@ -69,9 +69,10 @@ class FeatureSelector {
   std::size_t spacing_ = 0;
   PixelRegion smoothing_region_{};
   PixelRegion scoring_region_{};
-  std::vector<float> luma_;
+  std::vector<std::uint8_t> luma_;
   std::vector<std::uint8_t> mask_;
-  std::vector<std::uint8_t> available_;  // by pixel: 1 until a disc covers it
+  std::vector<std::uint8_t> covered_;  // by pixel: the mark of the last selection with a disc on it
+  std::uint8_t covered_mark_ = 0;
   std::unique_ptr<SeparableSmoother> smoother_;
   std::unique_ptr<GradientSums> gradient_sums_;
   std::vector<float> score_rows_;  // the last three rows of scores

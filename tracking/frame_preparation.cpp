@@ -50,34 +50,31 @@ HWY_INLINE auto LoadPixels(const std::uint8_t* row, std::size_t x) {
 #endif
 }
 
-// True if every pixel's alpha is above 127.
-bool LumaRows(const ArgbFrame& frame, float* luma) {
+template <class V>
+HWY_INLINE V LumaOf(V pixels) {
   const Pixels d;
-  const Floats df;
-  auto alphas = hn::Set(d, 255);
-  std::uint8_t last_alphas = 255;
-  const std::size_t N = hn::Lanes(d);
+  const auto red_green =
+      hn::Add(hn::Mul(Red(pixels), hn::Set(d, 9798)), hn::Mul(Green(pixels), hn::Set(d, 19235)));
+  const auto blue_half = hn::Add(hn::Mul(Blue(pixels), hn::Set(d, 3735)), hn::Set(d, 16384));
+  return hn::ShiftRight<15>(hn::Add(red_green, blue_half));
+}
+
+HWY_INLINE std::uint8_t LumaOfPixel(const std::uint8_t* p) {
+  return static_cast<std::uint8_t>((9798 * p[1] + 19235 * p[2] + 3735 * p[3] + 16384) >> 15);
+}
+
+void LumaRows(const ArgbFrame& frame, std::uint8_t* luma) {
+  const hn::Rebind<std::uint8_t, Pixels> d8;
+  const std::size_t N = hn::Lanes(Pixels());
   for (std::size_t y = 0; y < frame.height; ++y, luma += frame.width) {
     const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
     std::size_t x = 0;
     for (; x + N <= frame.width; x += N) {
       hwy::Prefetch(row + 4 * x + kBytesAhead);
-      const auto pixels = LoadPixels(row, x);
-      alphas = hn::And(alphas, pixels);
-      const auto red_green = hn::Add(hn::Mul(Red(pixels), hn::Set(d, 9798)),
-                                     hn::Mul(Green(pixels), hn::Set(d, 19235)));
-      const auto blue_half = hn::Add(hn::Mul(Blue(pixels), hn::Set(d, 3735)), hn::Set(d, 16384));
-      const auto sum = hn::ShiftRight<15>(hn::Add(red_green, blue_half));
-      hn::StoreU(hn::ConvertTo(df, sum), df, luma + x);
+      hn::StoreU(hn::DemoteTo(d8, LumaOf(LoadPixels(row, x))), d8, luma + x);
     }
-    for (; x < frame.width; ++x) {
-      const std::uint8_t* p = row + 4 * x;
-      luma[x] = static_cast<float>((9798 * p[1] + 19235 * p[2] + 3735 * p[3] + 16384) >> 15);
-      last_alphas &= p[0];
-    }
+    for (; x < frame.width; ++x) luma[x] = LumaOfPixel(row + 4 * x);
   }
-  const auto high_bit = hn::Set(d, 128);
-  return hn::AllTrue(d, hn::Eq(hn::And(alphas, high_bit), high_bit)) && last_alphas > 127;
 }
 
 void MaskRows(const ArgbFrame& frame, std::uint8_t* mask) {
@@ -113,15 +110,21 @@ void ColorRows(const ArgbFrame& frame, float* color) {
   }
 }
 
-void ColorByteRows(const ArgbFrame& frame, std::uint8_t* color) {
-  for (std::size_t y = 0; y < frame.height; ++y, color += 3 * frame.width) {
+// With kLuma, makes luma too and tells whether every pixel's alpha is above 127.
+template <bool kLuma>
+HWY_INLINE bool ColorBytes(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {
+  const Pixels d32;
+  auto alphas = hn::Set(d32, 255);
+  std::uint8_t last_alphas = 255;
+  for (std::size_t y = 0; y < frame.height; ++y, color += 3 * frame.width, luma += frame.width) {
     const std::uint8_t* row = frame.top_row + static_cast<std::ptrdiff_t>(y) * frame.row_bytes;
     std::size_t x = 0;
 #if HWY_TARGET != HWY_SCALAR
     // Colours go together in each block of four pixels, then the blocks' 12 bytes. What is stored
     // too much is the next pixels' place.
-    const hn::ScalableTag<std::uint8_t> d;
-    const hn::Repartition<std::uint32_t, decltype(d)> words;
+    const hn::Repartition<std::uint8_t, Pixels> d;
+    const hn::Repartition<std::uint32_t, Pixels> words;
+    const hn::Rebind<std::uint8_t, Pixels> d8;
     const std::size_t N = hn::Lanes(d);
     HWY_ALIGN static constexpr std::uint8_t kColors[16] = {1,  2,  3,  5,  6, 7, 9, 10,
                                                            11, 13, 14, 15, 0, 0, 0, 0};
@@ -133,15 +136,35 @@ void ColorByteRows(const ArgbFrame& frame, std::uint8_t* color) {
     const auto together = hn::SetTableIndices(words, places);
     for (; 3 * x + N <= 3 * frame.width; x += N / 4) {
       hwy::Prefetch(row + 4 * x + kBytesAhead);
-      const auto blocks = hn::TableLookupBytes(hn::LoadU(d, row + 4 * x), colors);
+      const auto bytes = hn::LoadU(d, row + 4 * x);
+      const auto blocks = hn::TableLookupBytes(bytes, colors);
       const auto packed = hn::TableLookupLanes(hn::BitCast(words, blocks), together);
       hn::StoreU(hn::BitCast(d, packed), d, color + 3 * x);
+      if constexpr (kLuma) {
+        const auto pixels = hn::BitCast(d32, bytes);
+        alphas = hn::And(alphas, pixels);
+        hn::StoreU(hn::DemoteTo(d8, LumaOf(pixels)), d8, luma + x);
+      }
     }
 #endif
     for (; x < frame.width; ++x) {
       for (std::size_t c = 0; c < 3; ++c) color[3 * x + c] = row[4 * x + 1 + c];
+      if constexpr (kLuma) {
+        luma[x] = LumaOfPixel(row + 4 * x);
+        last_alphas &= row[4 * x];
+      }
     }
   }
+  const auto high_bit = hn::Set(d32, 128);
+  return hn::AllTrue(d32, hn::Eq(hn::And(alphas, high_bit), high_bit)) && last_alphas > 127;
+}
+
+void ColorByteRows(const ArgbFrame& frame, std::uint8_t* color) {
+  ColorBytes<false>(frame, color, nullptr);
+}
+
+bool ColorAndLumaRows(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {
+  return ColorBytes<true>(frame, color, luma);
 }
 
 void WidenBytes(const std::uint8_t* bytes, std::size_t count, float* floats) {
@@ -167,24 +190,11 @@ HWY_EXPORT(LumaRows);
 HWY_EXPORT(MaskRows);
 HWY_EXPORT(ColorRows);
 HWY_EXPORT(ColorByteRows);
+HWY_EXPORT(ColorAndLumaRows);
 HWY_EXPORT(WidenBytes);
 
-void LumaFromArgb(const ArgbFrame& frame, float* luma) {
+void LumaFromArgb(const ArgbFrame& frame, std::uint8_t* luma) {
   HWY_DYNAMIC_DISPATCH(LumaRows)(frame, luma);
-}
-
-void SelectorImages::Luma(std::size_t frame_index, const ArgbFrame& frame, float* luma) {
-  opaque_ = HWY_DYNAMIC_DISPATCH(LumaRows)(frame, luma);
-  frame_index_ = frame_index;
-  top_row_ = frame.top_row;
-}
-
-void SelectorImages::Mask(std::size_t frame_index, const ArgbFrame& frame, std::uint8_t* mask) {
-  if (opaque_ && frame_index_ == frame_index && top_row_ == frame.top_row) {
-    std::fill_n(mask, frame.width * frame.height, std::uint8_t{1});
-  } else {
-    MaskFromArgb(frame, mask);
-  }
 }
 
 void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask) {
@@ -197,6 +207,10 @@ void ColorFromArgb(const ArgbFrame& frame, float* color) {
 
 void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color) {
   HWY_DYNAMIC_DISPATCH(ColorByteRows)(frame, color);
+}
+
+bool ColorAndLumaFromArgb(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {
+  return HWY_DYNAMIC_DISPATCH(ColorAndLumaRows)(frame, color, luma);
 }
 
 void FloatsFromBytes(const std::uint8_t* bytes, std::size_t count, float* floats) {

@@ -15,31 +15,19 @@ struct ArgbFrame {
   std::size_t height;
 };
 
-// width * height floats, whole numbers from 0 to 255: (9798 R + 19235 G + 3735 B + 2^14) >> 15,
-// which is Rec. 601 luma.
-void LumaFromArgb(const ArgbFrame& frame, float* luma);
+// width * height bytes: (9798 R + 19235 G + 3735 B + 2^14) >> 15, which is Rec. 601 luma.
+void LumaFromArgb(const ArgbFrame& frame, std::uint8_t* luma);
 
 // width * height bytes: 1 where alpha is above 127, else 0.
 void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask);
-
-// The luma of a source's frames and then, of the same pixels, the mask. Luma finds out whether a
-// frame is opaque, as most are, and the mask of one that is needs no second look at its pixels.
-class SelectorImages {
- public:
-  void Luma(std::size_t frame_index, const ArgbFrame& frame, float* luma);
-  void Mask(std::size_t frame_index, const ArgbFrame& frame, std::uint8_t* mask);
-
- private:
-  // Of the last luma.
-  bool opaque_ = false;
-  std::size_t frame_index_ = 0;
-  const std::uint8_t* top_row_ = nullptr;
-};
 
 // width * height * 3 floats or bytes: red, green, blue from 0 to 255, interleaved, whatever alpha
 // is.
 void ColorFromArgb(const ArgbFrame& frame, float* color);
 void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color);
+
+// Colour and luma in one walk. True if the whole mask would be 1.
+bool ColorAndLumaFromArgb(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma);
 
 void FloatsFromBytes(const std::uint8_t* bytes, std::size_t count, float* floats);
 

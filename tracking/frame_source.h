@@ -17,8 +17,8 @@ class FrameSource {
   virtual std::size_t width() const = 0;
   virtual std::size_t height() const = 0;
   virtual std::size_t frame_count() const = 0;
-  // Luma 0 to 255, width * height floats.
-  virtual void LoadLuma(std::size_t frame_index, float* destination) = 0;
+  // Luma, width * height bytes.
+  virtual void LoadLuma(std::size_t frame_index, std::uint8_t* destination) = 0;
   // 1 where a feature may be selected, else 0; width * height bytes.
   virtual void LoadMask(std::size_t frame_index, std::uint8_t* destination) = 0;
   // Red, green, blue 0 to 255, interleaved, width * height * 3 floats: level 0 of a pyramid.

@@ -2,7 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
-#include <cstring>
+#include <cstdint>
 #include <utility>
 
 #undef HWY_TARGET_INCLUDE
@@ -46,6 +46,22 @@ void SmoothAlongX(const float* taps, std::size_t radius, const float* padded, st
     hn::StoreU(s2, d, out + x + 2 * N);
     hn::StoreU(s3, d, out + x + 3 * N);
   }
+}
+
+// A row as floats, with `radius` repeats of its edges on both sides.
+void PadRow(const std::uint8_t* row, std::size_t count, std::size_t radius, float* padded) {
+  const hn::ScalableTag<float> d;
+  const hn::RebindToSigned<decltype(d)> di;
+  const hn::Rebind<std::uint8_t, decltype(d)> bytes;
+  const std::size_t N = hn::Lanes(d);
+  std::fill_n(padded, radius, static_cast<float>(row[0]));
+  float* out = padded + radius;
+  std::size_t x = 0;
+  for (; x + N <= count; x += N) {
+    hn::StoreU(hn::ConvertTo(d, hn::PromoteTo(di, hn::LoadU(bytes, row + x))), d, out + x);
+  }
+  for (; x < count; ++x) out[x] = row[x];
+  std::fill_n(out + count, radius, static_cast<float>(row[count - 1]));
 }
 
 constexpr std::size_t kRowsAtOnce = SeparableSmoother::kRowsAtOnce;
@@ -110,6 +126,7 @@ HWY_AFTER_NAMESPACE();
 namespace marrow::tracking {
 namespace {
 
+HWY_EXPORT(PadRow);
 HWY_EXPORT(SmoothAlongX);
 HWY_EXPORT(SmoothAlongY);
 HWY_EXPORT(BlockOfVectors);
@@ -136,44 +153,54 @@ std::vector<float> IntegratedGaussian(double sigma) {
   return kernel;
 }
 
-SeparableSmoother::SeparableSmoother(std::vector<float> kernel, std::size_t max_width)
+SeparableSmoother::SeparableSmoother(std::vector<float> kernel, std::size_t max_width,
+                                     std::size_t kept_rows)
     : taps_(kernel.begin() + static_cast<std::ptrdiff_t>(kernel.size() / 2), kernel.end()) {
   const std::size_t block = HWY_DYNAMIC_DISPATCH(BlockOfVectors)();
   ring_stride_ = (max_width + block - 1) / block * block;
   rows_.resize(kernel.size() + kRowsAtOnce - 1);
   padded_.resize(ring_stride_ + kernel.size());
   ring_.resize(ring_stride_ * rows_.size());
+  smooth_rows_ = (kept_rows + 2 * kRowsAtOnce - 2) / kRowsAtOnce * kRowsAtOnce;
+  smooth_.resize(ring_stride_ * smooth_rows_);
 }
 
-void SeparableSmoother::Smooth(float* image, std::size_t stride, const PixelRegion& region) {
-  if (region.empty()) return;
+void SeparableSmoother::Start(const std::uint8_t* image, std::size_t stride,
+                              const PixelRegion& region) {
+  image_ = image;
+  stride_ = stride;
+  region_ = region;
+  in_ring_ = 0;
+  made_ = 0;
+}
+
+const float* SeparableSmoother::Row(std::size_t y) {
+  while (made_ <= y) MakeRows();
+  return smooth_.data() + y % smooth_rows_ * ring_stride_;
+}
+
+void SeparableSmoother::MakeRows() {
   const std::size_t radius = taps_.size() - 1;
-  const std::size_t count = region.x1 - region.x0;
-  const std::size_t height = region.y1 - region.y0;
-  const auto row_of = [&](std::size_t y) { return image + (region.y0 + y) * stride + region.x0; };
+  const std::size_t count = region_.x1 - region_.x0;
+  const std::size_t height = region_.y1 - region_.y0;
   const auto ring_row = [&](std::size_t y) {
     return ring_.data() + y % rows_.size() * ring_stride_;
   };
-
-  // Row y may be overwritten as soon as rows up to y + radius are in the ring.
-  std::size_t in_ring = 0;
-  for (std::size_t y = 0; y < height; y += kRowsAtOnce) {
-    const std::size_t out_rows = std::min(kRowsAtOnce, height - y);
-    for (; in_ring < std::min(height, y + out_rows + radius); ++in_ring) {
-      const float* row = row_of(in_ring);
-      std::fill_n(padded_.begin(), radius, row[0]);
-      std::copy_n(row, count, padded_.data() + radius);
-      std::fill_n(padded_.data() + radius + count, radius, row[count - 1]);
-      HWY_DYNAMIC_DISPATCH(SmoothAlongX)
-      (taps_.data(), radius, padded_.data(), count, ring_row(in_ring));
-    }
-    for (std::size_t j = 0; j < out_rows + 2 * radius; ++j) {
-      const std::size_t below = std::min(y + j, height - 1 + radius);
-      rows_[j] = ring_row(below < radius ? 0 : below - radius);
-    }
-    HWY_DYNAMIC_DISPATCH(SmoothAlongY)
-    (taps_.data(), radius, rows_.data(), count, out_rows, row_of(y), stride);
+  const std::size_t out_rows = std::min(kRowsAtOnce, height - made_);
+  for (; in_ring_ < std::min(height, made_ + out_rows + radius); ++in_ring_) {
+    const std::uint8_t* row = image_ + (region_.y0 + in_ring_) * stride_ + region_.x0;
+    HWY_DYNAMIC_DISPATCH(PadRow)(row, count, radius, padded_.data());
+    HWY_DYNAMIC_DISPATCH(SmoothAlongX)
+    (taps_.data(), radius, padded_.data(), count, ring_row(in_ring_));
   }
+  for (std::size_t j = 0; j < out_rows + 2 * radius; ++j) {
+    const std::size_t below = std::min(made_ + j, height - 1 + radius);
+    rows_[j] = ring_row(below < radius ? 0 : below - radius);
+  }
+  HWY_DYNAMIC_DISPATCH(SmoothAlongY)
+  (taps_.data(), radius, rows_.data(), count, out_rows,
+   smooth_.data() + made_ % smooth_rows_ * ring_stride_, ring_stride_);
+  made_ += out_rows;
 }
 
 }  // namespace marrow::tracking

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <vector>
 
 namespace marrow::tracking {
@@ -15,27 +16,42 @@ struct PixelRegion {
 // function and normalised to sum 1: 2 r + 1 taps, r = trunc(3.5 sigma + 0.5).
 std::vector<float> IntegratedGaussian(double sigma);
 
-// Convolves images with a symmetric kernel along x, then along y. Every pixel runs the same 32-bit
-// operations in the same order on every instruction set, so a constant image stays exactly
-// constant.
+// Convolves images of bytes with a symmetric kernel along x, then along y, and gives the rows out
+// one by one while they are in the cache. Every pixel runs the same 32-bit operations in the same
+// order on every instruction set, so a constant image stays exactly constant; with the kernel {1}
+// rows are the image's own values.
 class SeparableSmoother {
  public:
   // Rows that the pass along y makes together: so many share what they read.
   static constexpr std::size_t kRowsAtOnce = 4;
 
   // An odd number of taps, symmetric about the middle one; lines of at most max_width pixels.
-  SeparableSmoother(std::vector<float> kernel, std::size_t max_width);
+  // kept_rows: so many of the last rows stay at hand.
+  SeparableSmoother(std::vector<float> kernel, std::size_t max_width, std::size_t kept_rows);
 
-  // Smooths a region of an image in place, rows `stride` samples apart. Past the region's edges its
-  // edge pixels repeat.
-  void Smooth(float* image, std::size_t stride, const PixelRegion& region);
+  // Starts on a region of an image with rows `stride` samples apart, not empty. Past the region's
+  // edges its edge pixels repeat. The image must stay unchanged until the last row is read.
+  void Start(const std::uint8_t* image, std::size_t stride, const PixelRegion& region);
+
+  // Row y of the region from its first column, valid until row y + kept_rows is asked for; no row
+  // may be asked for kept_rows or more before the last one.
+  const float* Row(std::size_t y);
 
  private:
+  void MakeRows();
+
   std::vector<float> taps_;         // middle tap first
   std::size_t ring_stride_;         // width rounded up to whole vectors
   std::vector<float> padded_;       // one row with its edges repeated
   std::vector<float> ring_;         // the rows that are at hand, smoothed along x
   std::vector<const float*> rows_;  // in the ring: those that a few neighbouring rows depend on
+  std::size_t smooth_rows_;         // in smooth_, a multiple of kRowsAtOnce
+  std::vector<float> smooth_;       // the last rows, smoothed both ways, one after the other
+  const std::uint8_t* image_ = nullptr;
+  std::size_t stride_ = 0;
+  PixelRegion region_{};
+  std::size_t in_ring_ = 0;  // rows that were put into the ring
+  std::size_t made_ = 0;     // rows that were put into smooth_
 };
 
 }  // namespace marrow::tracking

@@ -1,6 +1,7 @@
 #include "tracking/gradient_sums.h"
 
 #include <algorithm>
+#include <utility>
 
 #undef HWY_TARGET_INCLUDE
 #define HWY_TARGET_INCLUDE "tracking/gradient_sums.cpp"
@@ -20,22 +21,23 @@ struct Products {
   hn::Vec<D> xx, yy, xy;
 };
 
-// Of the pixels at `row`: reads one pixel more to each side.
+// Of the pixels from column x: reads one pixel more to each side.
 template <class D>
-HWY_INLINE Products<D> ProductsAt(D d, const float* row, std::size_t stride) {
+HWY_INLINE Products<D> ProductsAt(D d, const row_triple& rows, std::size_t x) {
+  const float* row = rows.row + x;
   const auto ix = hn::Sub(hn::LoadU(d, row + 1), hn::LoadU(d, row - 1));
-  const auto iy = hn::Sub(hn::LoadU(d, row + stride), hn::LoadU(d, row - stride));
+  const auto iy = hn::Sub(hn::LoadU(d, rows.below + x), hn::LoadU(d, rows.above + x));
   return {hn::Mul(ix, ix), hn::Mul(iy, iy), hn::Mul(ix, iy)};
 }
 
 // Adds an image row's products to the sums of their columns and, with kMove, takes another's away.
 template <bool kMove, class D>
-HWY_INLINE void UpdateColumns(D d, const float* entering, const float* leaving, std::size_t stride,
-                              std::size_t plane, double* column) {
+HWY_INLINE void UpdateColumns(D d, const row_triple& entering, const row_triple& leaving,
+                              std::size_t x, std::size_t plane, double* column) {
   const hn::Rebind<float, D> df;
-  const auto in = ProductsAt(df, entering, stride);
+  const auto in = ProductsAt(df, entering, x);
   if constexpr (kMove) {
-    const auto out = ProductsAt(df, leaving, stride);
+    const auto out = ProductsAt(df, leaving, x);
     const auto move = [&](auto from, auto to, double* sum) HWY_ATTR {
       const auto change = hn::Sub(hn::PromoteTo(d, from), hn::PromoteTo(d, to));
       hn::StoreU(hn::Add(hn::LoadU(d, sum), change), d, sum);
@@ -75,8 +77,8 @@ HWY_INLINE V LastLane(D d, V v) {
 // differences from the place before are added up within the vector, then to the sum so far. With
 // kMove the columns' sums are first moved down by one image row.
 template <bool kMove>
-HWY_INLINE void SumRow(const gradient_sum_planes& planes, const float* entering,
-                       const float* leaving, std::size_t stride, double* column_sums, float* sums) {
+HWY_INLINE void SumRow(const gradient_sum_planes& planes, const row_triple& entering,
+                       const row_triple& leaving, double* column_sums, float* sums) {
   const Sums d;
   const hn::Rebind<float, Sums> df;
   constexpr std::size_t N = hn::MaxLanes(Sums());
@@ -97,42 +99,42 @@ HWY_INLINE void SumRow(const gradient_sum_planes& planes, const float* entering,
   std::size_t x = 0;
   for (; x + N <= planes.columns; x += N) {
     if constexpr (kMove) {
-      UpdateColumns<true>(d, entering + x, leaving + x, stride, planes.column_stride, columns + x);
+      UpdateColumns<true>(d, entering, leaving, x, planes.column_stride, columns + x);
     }
     sum_window(x);
   }
   if (x == planes.columns) return;
   if constexpr (kMove) {
     for (std::size_t i = x; i < planes.columns; ++i) {
-      UpdateColumns<true>(hn::CappedTag<double, 1>(), entering + i, leaving + i, stride,
-                          planes.column_stride, columns + i);
+      UpdateColumns<true>(hn::CappedTag<double, 1>(), entering, leaving, i, planes.column_stride,
+                          columns + i);
     }
   }
   sum_window(x);
 }
 
-void AddToColumns(const gradient_sum_planes& planes, const float* entering, std::size_t stride,
+void AddToColumns(const gradient_sum_planes& planes, const row_triple& entering,
                   double* column_sums) {
   const Sums d;
   const std::size_t N = hn::Lanes(d);
   double* columns = column_sums + planes.window;
   std::size_t x = 0;
   for (; x + N <= planes.columns; x += N) {
-    UpdateColumns<false>(d, entering + x, nullptr, stride, planes.column_stride, columns + x);
+    UpdateColumns<false>(d, entering, {}, x, planes.column_stride, columns + x);
   }
   for (; x < planes.columns; ++x) {
-    UpdateColumns<false>(hn::CappedTag<double, 1>(), entering + x, nullptr, stride,
-                         planes.column_stride, columns + x);
+    UpdateColumns<false>(hn::CappedTag<double, 1>(), entering, {}, x, planes.column_stride,
+                         columns + x);
   }
 }
 
 void SumFirstRow(const gradient_sum_planes& planes, double* column_sums, float* sums) {
-  SumRow<false>(planes, nullptr, nullptr, 0, column_sums, sums);
+  SumRow<false>(planes, {}, {}, column_sums, sums);
 }
 
-void SumNextRow(const gradient_sum_planes& planes, const float* entering, const float* leaving,
-                std::size_t stride, double* column_sums, float* sums) {
-  SumRow<true>(planes, entering, leaving, stride, column_sums, sums);
+void SumNextRow(const gradient_sum_planes& planes, const row_triple& entering,
+                const row_triple& leaving, double* column_sums, float* sums) {
+  SumRow<true>(planes, entering, leaving, column_sums, sums);
 }
 
 }  // namespace HWY_NAMESPACE
@@ -159,12 +161,19 @@ GradientSums::GradientSums(std::size_t half_win_x, std::size_t half_win_y, std::
       column_sums_(3 * planes_.column_stride),
       sums_(3 * planes_.sum_stride) {}
 
-void GradientSums::Start(const float* image, std::size_t stride, const PixelRegion& region) {
-  stride_ = stride;
+void GradientSums::Start(ImageRows rows, const PixelRegion& region) {
+  rows_ = std::move(rows);
   planes_.columns = region.x1 - region.x0 + 2 * half_win_x_;
-  window_top_ = image + (region.y0 - half_win_y_) * stride + region.x0 - half_win_x_;
+  left_ = region.x0 - half_win_x_;
+  window_top_ = region.y0 - half_win_y_;
   started_ = false;
   std::fill(column_sums_.begin(), column_sums_.end(), 0.0);
+}
+
+// The lowest one first: what it pushes out is not read again.
+row_triple GradientSums::RowsAbout(std::size_t y) const {
+  const float* below = rows_(y + 1) + left_;
+  return {rows_(y - 1) + left_, rows_(y) + left_, below};
 }
 
 gradient_sum_row GradientSums::NextRow() {
@@ -172,15 +181,15 @@ gradient_sum_row GradientSums::NextRow() {
   if (!started_) {
     for (std::size_t v = 0; v < window_rows; ++v) {
       HWY_DYNAMIC_DISPATCH(AddToColumns)
-      (planes_, window_top_ + v * stride_, stride_, column_sums_.data());
+      (planes_, RowsAbout(window_top_ + v), column_sums_.data());
     }
     HWY_DYNAMIC_DISPATCH(SumFirstRow)(planes_, column_sums_.data(), sums_.data());
     started_ = true;
   } else {
+    const row_triple entering = RowsAbout(window_top_ + window_rows);
     HWY_DYNAMIC_DISPATCH(SumNextRow)
-    (planes_, window_top_ + window_rows * stride_, window_top_, stride_, column_sums_.data(),
-     sums_.data());
-    window_top_ += stride_;
+    (planes_, entering, RowsAbout(window_top_), column_sums_.data(), sums_.data());
+    ++window_top_;
   }
   const float* first = sums_.data() + 2 * half_win_x_;
   return {first, first + planes_.sum_stride, first + 2 * planes_.sum_stride};

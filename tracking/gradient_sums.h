@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <functional>
 #include <vector>
 
 #include "tracking/gaussian_smoothing.h"
@@ -12,6 +13,17 @@ struct gradient_sum_row {
   const float* xx;
   const float* yy;
   const float* xy;
+};
+
+// Row y of an image, from its column 0. Readers that go down an image ask for a row again while it
+// is at most a given number of rows above the lowest one they have seen.
+using ImageRows = std::function<const float*(std::size_t y)>;
+
+// A row of an image and its neighbours, from the first pixel in use.
+struct row_triple {
+  const float* above;
+  const float* row;
+  const float* below;
 };
 
 // How GradientSums' three planes lie, plane p beginning p strides behind the first. Before the
@@ -32,20 +44,25 @@ class GradientSums {
  public:
   GradientSums(std::size_t half_win_x, std::size_t half_win_y, std::size_t max_width);
 
-  // Starts on an image with rows `stride` samples apart. The windows of the region's pixels, and
-  // one pixel about them, must lie inside the image, and the region may not be empty. The image
-  // must stay unchanged until the last row is read.
-  void Start(const float* image, std::size_t stride, const PixelRegion& region);
+  // How many of the last rows of an image must be at hand.
+  std::size_t kept_rows() const { return 2 * half_win_y_ + 4; }
+
+  // Starts on an image. The windows of the region's pixels, and one pixel about them, must lie
+  // inside the image, and the region may not be empty.
+  void Start(ImageRows rows, const PixelRegion& region);
 
   // Sums of the region's next row, valid until the next call.
   gradient_sum_row NextRow();
 
  private:
+  row_triple RowsAbout(std::size_t y) const;
+
   std::size_t half_win_x_;
   std::size_t half_win_y_;
   gradient_sum_planes planes_;
-  const float* window_top_ = nullptr;  // first pixel of the first window of the row read last
-  std::size_t stride_ = 0;
+  ImageRows rows_;
+  std::size_t left_ = 0;        // first column of the first window
+  std::size_t window_top_ = 0;  // first row of the windows of the row read last
   bool started_ = false;
   std::vector<double> column_sums_;  // over the rows of a window
   std::vector<float> sums_;          // of windows that end at a column

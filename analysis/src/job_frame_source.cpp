@@ -2,8 +2,6 @@
 
 #include <algorithm>
 
-#include "tracking/color_pyramid.h"
-
 namespace kelp::analysis {
 namespace {
 
@@ -88,7 +86,7 @@ void JobFrameSource::ReleaseFrames() {
   Release(mask_);
 }
 
-void JobFrameSource::LoadLuma(std::size_t frame, float* destination) {
+void JobFrameSource::LoadLuma(std::size_t frame, std::uint8_t* destination) {
   Load(luma_, frame, [&](const auto& argb) { images_.Luma(frame, argb, destination); });
 }
 
@@ -102,7 +100,8 @@ void JobFrameSource::LoadColor(std::size_t frame, float* destination) {
 
 void JobFrameSource::LoadColorPyramid(std::size_t frame, marrow::tracking::ImagePyramid& pyramid,
                                       std::vector<float>& scratch) {
-  Load(color_, frame, [&](const auto& argb) { ColorPyramidFromArgb(argb, pyramid, scratch); });
+  Load(color_, frame,
+       [&](const auto& argb) { images_.ColorPyramid(frame, argb, pyramid, scratch); });
 }
 
 }  // namespace kelp::analysis

@@ -4,7 +4,7 @@
 #include <vector>
 
 #include "analysis/src/job.h"
-#include "tracking/frame_preparation.h"
+#include "tracking/frame_images.h"
 #include "tracking/frame_source.h"
 
 namespace kelp::analysis {
@@ -31,7 +31,7 @@ class JobFrameSource final : public marrow::tracking::FrameSource {
   std::size_t width() const override { return static_cast<std::size_t>(mask_.width); }
   std::size_t height() const override { return static_cast<std::size_t>(mask_.height); }
   std::size_t frame_count() const override { return static_cast<std::size_t>(run_.frame_count); }
-  void LoadLuma(std::size_t frame, float* destination) override;
+  void LoadLuma(std::size_t frame, std::uint8_t* destination) override;
   void LoadMask(std::size_t frame, std::uint8_t* destination) override;
   void LoadColor(std::size_t frame, float* destination) override;
   marrow::tracking::ImagePyramid::first_level first_level() const override {
@@ -59,7 +59,7 @@ class JobFrameSource final : public marrow::tracking::FrameSource {
   Job& job_;
   const RunFrames run_;
   Reader mask_, luma_, color_;
-  marrow::tracking::SelectorImages images_;
+  marrow::tracking::FrameImages images_;
 };
 
 }  // namespace kelp::analysis

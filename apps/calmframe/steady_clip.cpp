@@ -86,15 +86,17 @@ std::string Reuse::Text() const {
                  : "reused the analysis and the solve";
 }
 
-SteadyClip::Medium SteadyClip::Open(const std::string& path) {
-  std::unique_ptr<media::ClipReader> reader = media::ClipReader::Open(path);
+SteadyClip::Medium SteadyClip::Open(const std::string& path,
+                                    const std::vector<std::uint8_t>& found) {
+  std::unique_ptr<media::ClipReader> reader = media::ClipReader::Open(path, found);
   const media::ClipInfo info = reader->info();
   if (info.width < kLeastSide || info.height < kLeastSide) {
     throw media::Failure(media::Failure::Side::input, path + ": " + std::to_string(info.width) +
                                                           " by " + std::to_string(info.height) +
                                                           " pixels are too few to stabilize");
   }
-  return {info, host::OpenClip(std::move(reader))};
+  const std::shared_ptr<const media::FoundFrames> frames = reader->found();
+  return {info, host::OpenClip(std::move(reader)), frames};
 }
 
 SteadyClip::Medium SteadyClip::Blank(const host::Project& project) {
@@ -118,15 +120,15 @@ SteadyClip::Medium SteadyClip::Blank(const host::Project& project) {
   const auto draw = [](std::int64_t, host::Picture& picture) {
     std::memset(picture.memory(), 0xff, picture.bytes());
   };
-  return {info, host::MakeDrawnSource(source, draw), true};
+  return {info, host::MakeDrawnSource(source, draw), nullptr};
 }
 
 SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls)
-    : SteadyClip(nullptr, Open(path), controls) {}
+    : SteadyClip(nullptr, Open(path, {}), controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const std::string& path,
                        const ControlFlags& controls)
-    : SteadyClip(&project, Open(path), controls) {}
+    : SteadyClip(&project, Open(path, project.clip_frames), controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const ControlFlags& controls)
     : SteadyClip(&project, Blank(project), controls) {}
@@ -134,7 +136,7 @@ SteadyClip::SteadyClip(const host::Project& project, const ControlFlags& control
 SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
                        const ControlFlags& controls) try
     : info_(medium.info),
-      blank_(medium.blank),
+      found_(medium.found),
       host_(PluginPath(), SettingsFor(info_, controls)),
       values_(ResolveControls(controls, host_.declarations())),
       session_(host_) {
@@ -197,7 +199,7 @@ Reuse SteadyClip::Work(ProgressLine& progress) {
   const std::int32_t analyze = effect_->IndexOf(kAnalyzeButton);
   if (const auto button = effect_->Param(analyze);
       button && (button->ui_flags & HX_PARAM_UI_DISABLED) == 0) {
-    if (blank_) {
+    if (!found_) {
       throw media::Failure(media::Failure::Side::input,
                            path() + ": is gone, and what was made of it doesn't stand any more");
     }
@@ -241,6 +243,7 @@ host::Project SteadyClip::Saved() {
   const auto layer = effect_->shared()->layer()->state();
   project.clip_path = path();
   project.clip_content = layer->source->info().content;
+  if (found_) project.clip_frames = found_->Bytes();
   project.width = info_.width;
   project.height = info_.height;
   project.pixel_aspect = layer->source->info().pixel_aspect;

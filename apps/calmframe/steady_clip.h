@@ -1,6 +1,7 @@
 #pragma once
 
 #include <boost/shared_ptr.hpp>
+#include <cstdint>
 #include <memory>
 #include <string>
 #include <vector>
@@ -72,9 +73,9 @@ class SteadyClip {
   struct Medium {
     media::ClipInfo info;
     host::SourcePtr source;
-    bool blank = false;  // a stand-in for one that is gone
+    std::shared_ptr<const media::FoundFrames> found;  // null: a stand-in for one that is gone
   };
-  static Medium Open(const std::string& path);
+  static Medium Open(const std::string& path, const std::vector<std::uint8_t>& found);
   static Medium Blank(const host::Project& project);
   SteadyClip(const host::Project* project, const Medium& medium, const ControlFlags& controls);
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`.
@@ -85,7 +86,7 @@ class SteadyClip {
   const void* FirstWarp();
 
   const media::ClipInfo info_;
-  const bool blank_;
+  const std::shared_ptr<const media::FoundFrames> found_;  // null of a stand-in
   host::Host host_;
   const std::map<std::int32_t, double> values_;
   host::Session session_;

@@ -12,12 +12,13 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr auto kTickPeriod = 50ms;
+// Nothing wakes the loop when an analysis or a solve is through: what follows waits for a tick.
+constexpr auto kTickPeriod = 10ms;
 // Even when effects ask for more: an analysis asks several times a frame.
-constexpr auto kShortestPeriod = 10ms;
+constexpr auto kShortestPeriod = 5ms;
 constexpr int kTicksBeforeALook = 3;
 // In a row, after which an effect is taken to make no headway: in want of memory, say.
-constexpr int kFailedTicks = 100;
+constexpr int kFailedTicks = 5s / kTickPeriod;
 
 // Whether a tick of an effect that has work left went well.
 bool TickAll(std::mutex& mutex, std::vector<std::function<void()>>& posted,

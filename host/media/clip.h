@@ -26,6 +26,7 @@ class Failure : public std::runtime_error {
 struct Ratio {
   std::int64_t num = 1;
   std::int64_t den = 1;
+  bool operator==(const Ratio&) const = default;
 };
 
 enum class FieldOrder { progressive, top_first, bottom_first };
@@ -35,6 +36,7 @@ enum class FieldOrder { progressive, top_first, bottom_first };
 struct FrameTime {
   std::int64_t pts = 0;
   std::int64_t duration = 0;
+  bool operator==(const FrameTime&) const = default;
 };
 
 // The file's colour tags as it has them, code points of ITU-T H.273 (2: unspecified).
@@ -44,6 +46,7 @@ struct ColourTags {
   int matrix = 2;
   int range = 0;            // 0 unspecified, 1 limited, 2 full
   int chroma_location = 0;  // 0 unspecified, 1 left, 2 centre, 3 top left, 4 top, 5, 6 bottom
+  bool operator==(const ColourTags&) const = default;
 };
 
 struct ClipInfo {
@@ -65,13 +68,25 @@ struct ClipInfo {
   int stream = -1;      // the video stream's place in the file
   std::string warning;  // one line, empty when all is well: a damaged stream, and how many frames
                         // of it decode
+  bool operator==(const ClipInfo&) const = default;
+};
+
+// What opening a clip found, to be kept beside work that was made of it. Any thread.
+class FoundFrames {
+ public:
+  virtual ~FoundFrames() = default;
+  // For ClipReader::Open, in this process or another. Some nine bytes a frame.
+  virtual std::vector<std::uint8_t> Bytes() const = 0;
 };
 
 // Reads any frame of a clip's first video stream. For one thread at a time.
 class ClipReader {
  public:
-  // Opens the file and finds every frame. Throws Failure (input).
-  static std::unique_ptr<ClipReader> Open(const std::string& path);
+  // Opens the file and finds every frame, which costs decoding all of it. Not so where `found`
+  // tells what was found before in a file of the same contents; whatever else stands there, or
+  // comes from other libraries, counts for nothing. Throws Failure (input).
+  static std::unique_ptr<ClipReader> Open(const std::string& path,
+                                          const std::vector<std::uint8_t>& found = {});
   virtual ~ClipReader() = default;
 
   // Another reader of the clip, with a place of its own. One of a file doesn't search it again for
@@ -79,6 +94,8 @@ class ClipReader {
   virtual std::unique_ptr<ClipReader> Again() const { return Open(info().path); }
 
   virtual const ClipInfo& info() const = 0;
+  // Null of a clip that is made, not read.
+  virtual std::shared_ptr<const FoundFrames> found() const { return nullptr; }
 
   // Writes frame `frame` into info().height rows of info().width pixels, row_bytes apart, alpha as
   // in the file or full. Ascending frames are decoded ahead on a thread of the reader's own. Throws

@@ -6,6 +6,7 @@
 #include "host/media/decode_ahead.h"
 #include "host/media/decoder.h"
 #include "host/media/frame_index.h"
+#include "host/media/frame_list.h"
 #include "host/media/pixel_conversion.h"
 
 namespace calmframe::media {
@@ -16,23 +17,16 @@ constexpr std::size_t kSkippedAtMost = 8;
 
 class FfmpegReader final : public ClipReader {
  public:
-  explicit FfmpegReader(const std::string& path) : to_pixels_(info_) {
-    {
-      Decoder decoder(path);
-      index_ = std::make_shared<const FrameIndex>(ScanFrames(path, decoder, info_));
-    }
-    finder_.emplace(path, *index_);
-  }
-  FfmpegReader(const ClipInfo& info, std::shared_ptr<const FrameIndex> index)
-      : info_(info), index_(std::move(index)), to_pixels_(info_) {
-    finder_.emplace(info_.path, *index_);
-  }
+  explicit FfmpegReader(std::shared_ptr<const FrameList> list)
+      : list_(std::move(list)), to_pixels_(info()), finder_(info().path, list_->index) {}
 
   std::unique_ptr<ClipReader> Again() const override {
-    return std::make_unique<FfmpegReader>(info_, index_);
+    return std::make_unique<FfmpegReader>(list_);
   }
 
-  const ClipInfo& info() const override { return info_; }
+  const ClipInfo& info() const override { return list_->info; }
+  std::shared_ptr<const FoundFrames> found() const override { return list_; }
+  bool BeginsAsListed() { return finder_.BeginsAs(info()); }
 
   void Read(std::size_t frame, HX_Pixel8* pixels, std::ptrdiff_t row_bytes) override {
     ReadAs(frame, pixels, row_bytes);
@@ -47,8 +41,8 @@ class FfmpegReader final : public ClipReader {
  private:
   template <class Pixel>
   void ReadAs(std::size_t frame, Pixel* pixels, std::ptrdiff_t row_bytes) {
-    if (frame >= info_.frame_count) {
-      throw Failure(Failure::Side::input, info_.path + ": has no frame " + std::to_string(frame));
+    if (frame >= info().frame_count) {
+      throw Failure(Failure::Side::input, info().path + ": has no frame " + std::to_string(frame));
     }
     try {
       Fetch(frame);
@@ -58,7 +52,7 @@ class FfmpegReader final : public ClipReader {
     } catch (const std::bad_alloc&) {
       throw;
     } catch (const std::exception& error) {
-      throw Failure(Failure::Side::input, info_.path + ": " + error.what());
+      throw Failure(Failure::Side::input, info().path + ": " + error.what());
     }
   }
 
@@ -70,21 +64,20 @@ class FfmpegReader final : public ClipReader {
     if (ahead_ && (frame < ahead_->next() || frame > ahead_->next() + kSkippedAtMost)) {
       ahead_.reset();
     }
-    if (!ahead_ && ascending) ahead_.emplace(*finder_, frame, info_.frame_count);
+    if (!ahead_ && ascending) ahead_.emplace(finder_, frame, info().frame_count);
     if (ahead_) {
       while (ahead_->next() < frame) ahead_->Pop();
       last_ = ahead_->Pop();
     } else {
       const std::atomic<bool> never = false;
-      last_ = finder_->Get(frame, never);
+      last_ = finder_.Get(frame, never);
     }
     last_number_ = frame;
   }
 
-  ClipInfo info_;
-  std::shared_ptr<const FrameIndex> index_;
+  const std::shared_ptr<const FrameList> list_;
   FrameToPixels to_pixels_;
-  std::optional<FrameFinder> finder_;
+  FrameFinder finder_;
   FramePtr last_;
   std::size_t last_number_ = 0;
   std::optional<DecodeAhead> ahead_;  // last: it uses the finder until it is gone
@@ -92,8 +85,21 @@ class FfmpegReader final : public ClipReader {
 
 }  // namespace
 
-std::unique_ptr<ClipReader> ClipReader::Open(const std::string& path) {
-  return std::make_unique<FfmpegReader>(path);
+std::unique_ptr<ClipReader> ClipReader::Open(const std::string& path,
+                                             const std::vector<std::uint8_t>& found) {
+  if (!found.empty()) {
+    if (std::optional<FrameList> list = FrameListOf(found, path)) {
+      auto reader =
+          std::make_unique<FfmpegReader>(std::make_shared<const FrameList>(std::move(*list)));
+      if (reader->BeginsAsListed()) return reader;
+    }
+  }
+  FrameList list;
+  {
+    Decoder decoder(path);
+    list.index = ScanFrames(path, decoder, list.info);
+  }
+  return std::make_unique<FfmpegReader>(std::make_shared<const FrameList>(std::move(list)));
 }
 
 }  // namespace calmframe::media

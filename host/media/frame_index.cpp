@@ -220,6 +220,20 @@ FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info,
   return index;
 }
 
+bool FrameFinder::BeginsAs(const ClipInfo& info) {
+  const AVStream& stream = decoder_.stream();
+  if (stream.index != info.stream || avcodec_get_name(stream.codecpar->codec_id) != info.codec ||
+      stream.time_base.num != info.time_base.num || stream.time_base.den != info.time_base.den) {
+    return false;
+  }
+  pending_ = decoder_.Next();
+  if (!pending_) return false;
+  const bool turned = info.rotation % 180 != 0;
+  return pending_->width == (turned ? info.height : info.width) &&
+         pending_->height == (turned ? info.width : info.height) &&
+         OwnTime(*pending_) == index_[0].pts && Fingerprint(*pending_) == index_[0].fingerprint;
+}
+
 std::vector<std::size_t> FrameFinder::StartsFor(std::size_t frame) const {
   std::vector<std::size_t> starts;
   for (std::size_t i = frame + 1; i-- > 1 && starts.size() < kStartsTried;) {

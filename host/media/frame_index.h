@@ -39,6 +39,11 @@ class FrameFinder {
   FrameFinder(const std::string& path, const FrameIndex& index)
       : path_(path), decoder_(path), index_(index) {}
 
+  // Before any frame was asked for: whether the stream and its first frame are those that the index
+  // and the info tell of. Not so where it is another clip, or this processor's decoder gives other
+  // pixels than that which made the index. Throws Failure (input).
+  bool BeginsAs(const ClipInfo& info);
+
   // Null if `stop` became true. Throws Failure (input) if the frame no longer decodes.
   FramePtr Get(std::size_t frame, const std::atomic<bool>& stop);
 

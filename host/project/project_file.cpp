@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
@@ -22,8 +23,8 @@ namespace fs = std::filesystem;
 using tessel::utility::Guid;
 
 constexpr std::int64_t kApplicationId = 0x43616c6d;  // "Calm", in the database's header
-// 1: the first. 2: the pixels' aspect; it was not told before.
-constexpr std::int64_t kVersion = 2;
+// 1: the first. 2: the pixels' aspect; it was not told before. 3: the clip's frames.
+constexpr std::int64_t kVersion = 3;
 
 constexpr char kChecksum[] = "checksum";
 constexpr char kCreate[] =
@@ -31,8 +32,11 @@ constexpr char kCreate[] =
     "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
     "CREATE TABLE instance (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
     "PRAGMA application_id = 1130458221;";
-constexpr char kMarkVersion[] = "PRAGMA user_version = 2";
-static_assert(kApplicationId == 1130458221 && kVersion == 2);
+constexpr char kCreateFrames[] =
+    "CREATE TABLE IF NOT EXISTS frames (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT "
+    "NULL)";
+constexpr char kMarkVersion[] = "PRAGMA user_version = 3";
+static_assert(kApplicationId == 1130458221 && kVersion == 3);
 
 [[noreturn]] void Fail(const std::string& path, const std::string& cause) {
   throw ProjectFailure(path + ": " + cause);
@@ -104,6 +108,7 @@ Guid ChecksumOf(const Project& project, std::int64_t version) {
     mix(&value, sizeof value);
   }
   mix(project.effect.instance.data(), project.effect.instance.size());
+  if (version >= 3) mix(project.clip_frames.data(), project.clip_frames.size());
   return sum;
 }
 
@@ -156,6 +161,22 @@ struct SettingReader {
   }
 };
 
+void WriteBytes(SqliteDatabase& database, const char* insert,
+                const std::vector<std::uint8_t>& bytes) {
+  SqliteStatement statement(database, insert);
+  statement.Bind(1, bytes);
+  statement.Step();
+}
+
+// `select`: of one row, its length and its bytes.
+std::vector<std::uint8_t> ReadBytes(SqliteDatabase& database, const std::string& path,
+                                    const char* select, std::size_t most) {
+  SqliteStatement statement(database, select);
+  if (!statement.Step()) throw SqliteError(SQLITE_CORRUPT, select);
+  if (statement.Integer(0) > static_cast<std::int64_t>(most)) FailForSize(path, most);
+  return statement.Bytes(1);
+}
+
 void Write(SqliteDatabase& database, const Project& project) {
   SqliteStatement setting(database, "INSERT INTO setting VALUES (?, ?)");
   VisitSettings(project, kVersion, SettingWriter{setting});
@@ -166,9 +187,8 @@ void Write(SqliteDatabase& database, const Project& project) {
     parameter.Bind(2, value);
     parameter.Step();
   }
-  SqliteStatement instance(database, "INSERT INTO instance VALUES (1, ?)");
-  instance.Bind(1, project.effect.instance);
-  instance.Step();
+  WriteBytes(database, "INSERT INTO instance VALUES (1, ?)", project.effect.instance);
+  WriteBytes(database, "INSERT INTO frames VALUES (1, ?)", project.clip_frames);
 }
 
 std::int64_t CheckedVersion(const std::string& path, SqliteDatabase& database) {
@@ -198,6 +218,7 @@ void Create(const fs::path& path, const Project& project) {
       SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
       database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
       database.Run(kCreate);
+      database.Run(kCreateFrames);
       database.Run(kMarkVersion);
       Write(database, project);
       database.Run("COMMIT");
@@ -216,7 +237,9 @@ void Replace(const fs::path& path, const Project& project) {
   SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
   CheckedVersion(path, database);
   database.Run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
-  database.Run("DELETE FROM setting; DELETE FROM parameter; DELETE FROM instance");
+  database.Run(kCreateFrames);
+  database.Run(
+      "DELETE FROM setting; DELETE FROM parameter; DELETE FROM instance; DELETE FROM frames");
   Write(database, project);
   database.Run(kMarkVersion);
   database.Run("COMMIT");
@@ -225,7 +248,9 @@ void Replace(const fs::path& path, const Project& project) {
 }  // namespace
 
 void SaveProject(const std::string& path, const Project& project, std::size_t most) try {
-  if (project.effect.instance.size() > most) FailForSize(path, most);
+  if (std::max(project.effect.instance.size(), project.clip_frames.size()) > most) {
+    FailForSize(path, most);
+  }
   std::error_code error;
   const fs::path place = fs::weakly_canonical(fs::absolute(path), error);
   Project saved = project;
@@ -256,10 +281,12 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   while (parameter.Step()) {
     project.effect.values[static_cast<std::int32_t>(parameter.Integer(0))] = parameter.Real(1);
   }
-  SqliteStatement instance(database, "SELECT length(bytes), bytes FROM instance");
-  if (!instance.Step()) throw SqliteError(SQLITE_CORRUPT, "instance");
-  if (instance.Integer(0) > static_cast<std::int64_t>(most)) FailForSize(path, most);
-  project.effect.instance = instance.Bytes(1);
+  project.effect.instance =
+      ReadBytes(database, path, "SELECT length(bytes), bytes FROM instance", most);
+  if (version >= 3) {
+    project.clip_frames =
+        ReadBytes(database, path, "SELECT length(bytes), bytes FROM frames", most);
+  }
   Guid checksum;
   SettingReader{setting}(kChecksum, checksum);
   if (checksum != ChecksumOf(project, version) || project.ticks_per_frame <= 0 ||

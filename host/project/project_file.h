@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <stdexcept>
 #include <string>
+#include <vector>
 
 #include "host/effects/effect.h"
 #include "platform/tessel/guid.h"
@@ -15,6 +16,9 @@ struct Project {
   std::string clip_path;               // absolute, when the project was saved
   std::string clip_relative;           // to the project's folder; empty where there is no such way
   tessel::utility::Guid clip_content;  // ContentOf
+  // What media::ClipReader found in it, that the next opening needs no search; may be empty, or
+  // nothing that a reader believes.
+  std::vector<std::uint8_t> clip_frames;
   std::int32_t width = 0, height = 0;  // of the clip's frames
   HX_Ratio pixel_aspect{1, 1};         // width : height of one of their pixels
 
@@ -31,7 +35,7 @@ class ProjectFailure : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
-// Of a flattened instance; SQLite holds not much more in one row.
+// Of a flattened instance, and of the clip's frames; SQLite holds not much more in one row.
 constexpr std::size_t kMaximumInstanceBytes = std::size_t{900} << 20;
 
 // The project's paths are made from clip_path and the project's own place. Whatever ends the

@@ -65,7 +65,7 @@ class DrawnSource final : public marrow::tracking::FrameSource {
   std::size_t width() const override { return kWidth; }
   std::size_t height() const override { return kHeight; }
   std::size_t frame_count() const override { return frames_; }
-  void LoadLuma(std::size_t f, float* out) override { LumaFromArgb(Frame(f), out); }
+  void LoadLuma(std::size_t f, std::uint8_t* out) override { LumaFromArgb(Frame(f), out); }
   void LoadMask(std::size_t f, std::uint8_t* out) override { MaskFromArgb(Frame(f), out); }
   void LoadColor(std::size_t f, float* out) override { ColorFromArgb(Frame(f), out); }
 

@@ -224,6 +224,19 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   EXPECT_EQ(Run("render --project gone.calm x.mkv").code, 3);
 }
 
+// The next run of saved work doesn't decode the clip to number its frames, but says the same of it.
+TEST_F(ProgramTest, ADamagedClipIsToldOfInEveryRun) {
+  MakeClip("whole.avi", 160, 120, 40);
+  const std::string whole = Content("whole.avi");
+  MakeFile("cut.avi", whole.substr(0, whole.size() * 3 / 4));
+  const std::string work = "stabilize cut.avi - --project work.calm --quiet ";
+  const std::string first = Run(work + "> a.y4m").text;
+  EXPECT_THAT(first, HasSubstr("cut.avi: damaged or cut short, "));
+  EXPECT_EQ(Run(work + "> b.y4m").text, first);
+  EXPECT_TRUE(Content("b.y4m") == Content("a.y4m"));
+  EXPECT_EQ(Run(work + "--smoothness 10 > c.y4m").text, first);
+}
+
 TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
   MakeClip("in.mp4", 320, 240, 90);
   const pid_t child = fork();

@@ -26,9 +26,12 @@ TEST(ColorPyramidTest, EqualsConversionAndLevelsApart) {
       std::fill(pyramid.data.begin(), pyramid.data.end(), 7.0f);
       std::fill(expected.data.begin(), expected.data.end(), 7.0f);
       std::vector<float> scratch;
+      std::vector<std::uint8_t> luma(w * h), expected_luma(w * h);
       ColorFromArgb(frame, expected.LevelData(0));
       BuildLevels(expected);
-      ColorPyramidFromArgb(frame, pyramid, scratch);
+      ColorPyramidFromArgb(frame, pyramid, scratch, luma.data());
+      LumaFromArgb(frame, expected_luma.data());
+      ASSERT_EQ(luma, expected_luma);
       std::vector<float> found(pyramid.bytes.begin(), pyramid.bytes.end());
       found.insert(found.end(), pyramid.data.begin(), pyramid.data.end());
       ASSERT_TRUE(found == expected.data) << w << "x" << h << ", " << levels;

@@ -308,6 +308,19 @@ TEST_F(FeatureSelectionTest, TheBetterOfTwoWithinTheSpacingAndTheDiscsRim) {
   EXPECT_EQ(selector.selected[2].x, 4.0f);
 }
 
+TEST_F(FeatureSelectionTest, NoSelectionIsInAnothersWay) {
+  FeatureSelector selector = Selector(4);
+  selector.candidates = {{10 * 40 + 10, 9.0f}, {10 * 40 + 12, 8.0f}, {10 * 40 + 15, 7.0f}};
+  const tracking_feature<float> cell{10.0f, 10.0f, 0, 0.0f};
+  for (int round = 0; round < 600; ++round) {
+    selector.SelectFirst();
+    ASSERT_EQ(selector.selected.size(), 2u) << round;
+    selector.SelectAvoiding(&cell, 1);
+    ASSERT_EQ(selector.selected.size(), 1u) << round;
+    ASSERT_EQ(selector.selected[0].x, 15.0f);
+  }
+}
+
 TEST_F(FeatureSelectionTest, StopsAtTheCountOrTheLimit) {
   FeatureSelector selector = Selector(1, 2);
   selector.candidates = {{0, 9.0f}, {10, 8.0f}, {20, 7.0f}};

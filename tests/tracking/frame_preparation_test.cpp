@@ -15,7 +15,7 @@ TEST(LumaTest, WorkedValues) {
   const std::vector<std::uint8_t> pixels = {0,   255, 255, 255, 255, 255, 0,   0,   9,   0,
                                             255, 0,   1,   0,   0,   255, 0,   128, 128, 128,
                                             0,   10,  20,  30,  0,   200, 100, 50};
-  std::vector<float> luma(7);
+  std::vector<std::uint8_t> luma(7);
   LumaFromArgb({pixels.data(), 28, 7, 1}, luma.data());
   EXPECT_THAT(luma, ElementsAre(255, 76, 150, 29, 128, 18, 124));
 }
@@ -41,12 +41,17 @@ TEST(FramePreparationTest, EqualsThePlainLoopsForAnyWidthAndStride) {
         const ArgbFrame frame{bytes.data() + (bottom_up ? pitch * (kHeight - 1) : 0),
                               bottom_up ? -pitch : pitch, width, kHeight};
         const std::size_t size = width * kHeight;
-        std::vector<float> luma(size + 1, -7), color(3 * size + 1, -7);
-        std::vector<std::uint8_t> mask(size + 1, 7), color_bytes(3 * size + 1, 7);
+        std::vector<float> color(3 * size + 1, -7);
+        std::vector<std::uint8_t> luma(size + 1, 7), mask(size + 1, 7),
+            color_bytes(3 * size + 1, 7);
+        std::vector<std::uint8_t> both_luma(size + 1, 7), both_color(3 * size + 1, 7);
         LumaFromArgb(frame, luma.data());
         MaskFromArgb(frame, mask.data());
         ColorFromArgb(frame, color.data());
         ColorFromArgb(frame, color_bytes.data());
+        ColorAndLumaFromArgb(frame, both_color.data(), both_luma.data());
+        ASSERT_EQ(both_color, color_bytes);
+        ASSERT_EQ(both_luma, luma);
         for (std::size_t i = 0; i < size; ++i) {
           const std::size_t y = i / width;
           const auto* p = &bytes[(bottom_up ? kHeight - 1 - y : y) * pitch + 4 * (i % width)];
@@ -57,7 +62,7 @@ TEST(FramePreparationTest, EqualsThePlainLoopsForAnyWidthAndStride) {
             ASSERT_EQ(color_bytes[3 * i + c], p[1 + c]);
           }
         }
-        ASSERT_EQ(luma[size], -7);
+        ASSERT_EQ(luma[size], 7);
         ASSERT_EQ(color[3 * size], -7);
         ASSERT_EQ(color_bytes[3 * size], 7);
         ASSERT_EQ(mask[size], 7);
@@ -70,44 +75,15 @@ TEST(FramePreparationTest, TransparentPixelsKeepTheirColour) {
   const std::vector<std::uint8_t> pixels(4 * 40, 0);
   std::vector<std::uint8_t> colored = pixels;
   for (std::size_t i = 0; i < 40; ++i) colored[4 * i + 2] = 200;
-  std::vector<float> luma(40), color(120);
-  std::vector<std::uint8_t> mask(40, 1);
+  std::vector<float> color(120);
+  std::vector<std::uint8_t> luma(40), mask(40, 1);
   const ArgbFrame frame{colored.data(), 40, 10, 4};
   LumaFromArgb(frame, luma.data());
   MaskFromArgb(frame, mask.data());
   ColorFromArgb(frame, color.data());
-  EXPECT_THAT(luma, Each(117.0f));
+  EXPECT_THAT(luma, Each(117));
   EXPECT_THAT(mask, Each(0));
   EXPECT_EQ(color[1], 200.0f);
-}
-
-TEST(SelectorImagesTest, MasksAreThoseOfTheirOwnPixels) {
-  for (const std::size_t width : {1, 16, 37}) {
-    const std::size_t size = 2 * width;
-    std::vector<std::uint8_t> pixels(4 * size, 200), found(size), expected(size);
-    std::vector<float> luma(size);
-    SelectorImages images;
-    const ArgbFrame frame{pixels.data(), static_cast<std::ptrdiff_t>(4 * width), width, 2};
-    const auto expect_mask = [&](std::size_t index, const ArgbFrame& of) {
-      images.Mask(index, of, found.data());
-      MaskFromArgb(of, expected.data());
-      ASSERT_EQ(found, expected);
-    };
-    images.Luma(0, frame, luma.data());
-    expect_mask(0, frame);
-    for (std::size_t hole = 0; hole < size; ++hole) {
-      pixels[4 * hole] = 127;
-      images.Luma(hole, frame, luma.data());
-      expect_mask(hole, frame);
-      pixels[4 * hole] = 128;
-    }
-    // Other pixels than the luma's: a later frame in the same place, and another place.
-    images.Luma(7, frame, luma.data());
-    pixels[0] = 0;
-    expect_mask(8, frame);
-    std::vector<std::uint8_t> others(4 * size, 0);
-    expect_mask(7, {others.data(), frame.row_bytes, width, 2});
-  }
 }
 
 }  // namespace

@@ -25,7 +25,7 @@ class DrawnFrames final : public FrameSource {
   std::size_t width() const override { return 120; }
   std::size_t height() const override { return 96; }
   std::size_t frame_count() const override { return frames_; }
-  void LoadLuma(std::size_t f, float* out) override { Draw('L', f, 1, out); }
+  void LoadLuma(std::size_t f, std::uint8_t* out) override { Draw('L', f, 1, out); }
   void LoadColor(std::size_t f, float* out) override { Draw('C', f, 3, out); }
   void LoadMask(std::size_t f, std::uint8_t* out) override {
     Request('M', f);
@@ -40,7 +40,8 @@ class DrawnFrames final : public FrameSource {
     requests += kind + std::to_string(f) + " ";
     on_request(kind + std::to_string(f));
   }
-  void Draw(char kind, std::size_t f, std::size_t channels, float* out) {
+  template <class T>
+  void Draw(char kind, std::size_t f, std::size_t channels, T* out) {
     Request(kind, f);
     for (std::size_t i = 0; i < width() * height() * channels; ++i) {
       const std::size_t pixel = i / channels;

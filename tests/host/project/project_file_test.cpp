@@ -36,6 +36,7 @@ class ProjectTest : public testing::Test {
     Project project;
     project.clip_path = Path("clips/walk.mp4");
     project.clip_content = ContentOf(project.clip_path);
+    project.clip_frames.assign(bytes / 100, static_cast<std::uint8_t>(mark + 50));
     project.width = 1920;
     project.height = 1080;
     project.pixel_aspect = {64, 45};
@@ -51,6 +52,7 @@ class ProjectTest : public testing::Test {
 
   static void ExpectSame(const Project& a, const Project& b) {
     EXPECT_EQ(a.clip_content, b.clip_content);
+    EXPECT_TRUE(a.clip_frames == b.clip_frames);
     EXPECT_EQ(a.width, b.width);
     EXPECT_EQ(a.height, b.height);
     EXPECT_EQ(a.pixel_aspect.num, b.pixel_aspect.num);
@@ -78,7 +80,7 @@ class ProjectTest : public testing::Test {
 
 TEST_F(ProjectTest, WhatIsSavedComesBackToTheBit) {
   const std::string path = Path("walk.calm");
-  for (const int mark : {1, 2, 0}) {  // made, then replaced; the last has no instance bytes
+  for (const int mark : {1, 2, 0}) {  // made, then replaced; the last has no bytes of either kind
     const Project saved = Sample(mark, mark == 0 ? 0 : 300000);
     SaveProject(path, saved);
     ExpectSame(LoadProject(path), saved);
@@ -110,29 +112,43 @@ TEST_F(ProjectTest, TheClipIsFoundWhereverItWentAndKnownWhenItChanged) {
   EXPECT_THAT(Refusal([&] { FindClip(Path("moved/walk.calm"), project); }), HasSubstr("is gone"));
 }
 
-TEST_F(ProjectTest, AProjectOfTheFirstVersionIsTakenWithSquarePixels) {
-  const std::string path = Path("old.calm");
-  SqliteDatabase(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
-      .Run(
-          "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
-          "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
-          "CREATE TABLE instance (id INTEGER PRIMARY KEY, bytes BLOB NOT NULL);"
-          "PRAGMA application_id = 1130458221; PRAGMA user_version = 1;"
-          "INSERT INTO setting VALUES ('clip_path', '/clips/walk.mp4'),"
-          "('clip_relative', 'clips/walk.mp4'),"
-          "('clip_content', '00112233-4455-6677-8899-aabbccddeeff'), ('width', 1920),"
-          "('height', 1080), ('start_frame', -3), ('length', 495),"
-          "('ticks_per_frame', 23543520), ('field_type', 1),"
-          "('match_name', 'KLPX SubspaceStabilizer'),"
-          "('checksum', 'ea2167a1-b2b9-170e-9991-37971d8e65f8');"
-          "INSERT INTO parameter VALUES (20, 50.0);"
-          "INSERT INTO instance VALUES (1, X'010203');");
-  const Project project = LoadProject(path);
-  EXPECT_EQ(project.length, 495);
-  EXPECT_EQ(project.pixel_aspect.num, 1);
-  EXPECT_EQ(project.pixel_aspect.den, 1u);
-  SaveProject(path, Sample(2));
-  ExpectSame(LoadProject(path), Sample(2));
+TEST_F(ProjectTest, ProjectsOfOlderVersionsAreTakenAndReplaced) {
+  const std::string aspect = ", ('pixel_aspect_num', 64), ('pixel_aspect_den', 45)";
+  const struct {
+    int version;
+    std::string more_settings;
+    const char* checksum;
+    std::int32_t aspect_num;
+    std::uint32_t aspect_den;
+  } cases[] = {{1, "", "ea2167a1-b2b9-170e-9991-37971d8e65f8", 1, 1},
+               {2, aspect, "139746d3-1f72-716f-bb11-540ad5d927c4", 64, 45}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.version);
+    const std::string path = Path("old" + std::to_string(c.version) + ".calm");
+    const std::string sql =
+        "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
+        "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
+        "CREATE TABLE instance (id INTEGER PRIMARY KEY, bytes BLOB NOT NULL);"
+        "PRAGMA application_id = 1130458221; PRAGMA user_version = " +
+        std::to_string(c.version) +
+        ";INSERT INTO setting VALUES ('clip_path', '/clips/walk.mp4'),"
+        "('clip_relative', 'clips/walk.mp4'),"
+        "('clip_content', '00112233-4455-6677-8899-aabbccddeeff'), ('width', 1920),"
+        "('height', 1080), ('start_frame', -3), ('length', 495),"
+        "('ticks_per_frame', 23543520), ('field_type', 1),"
+        "('match_name', 'KLPX SubspaceStabilizer'), ('checksum', '" +
+        c.checksum + "')" + c.more_settings +
+        ";INSERT INTO parameter VALUES (20, 50.0);"
+        "INSERT INTO instance VALUES (1, X'010203');";
+    SqliteDatabase(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE).Run(sql.c_str());
+    const Project project = LoadProject(path);
+    EXPECT_EQ(project.length, 495);
+    EXPECT_EQ(project.pixel_aspect.num, c.aspect_num);
+    EXPECT_EQ(project.pixel_aspect.den, c.aspect_den);
+    EXPECT_TRUE(project.clip_frames.empty());
+    SaveProject(path, Sample(2));
+    ExpectSame(LoadProject(path), Sample(2));
+  }
 }
 
 TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
@@ -141,7 +157,7 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
   SqliteDatabase(Path("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
       .Run("CREATE TABLE t (x)");
   SaveProject(Path("newer.calm"), Sample(1));
-  SqliteDatabase(Path("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 3");
+  SqliteDatabase(Path("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 4");
   const struct {
     const char* name;
     const char* cause;
