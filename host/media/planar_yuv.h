@@ -18,7 +18,8 @@ namespace calmframe::media {
 // Planar YUV of 8 to 16 bits to pixels of 8 bits and back, by zimg: chroma by the bicubic of
 // Keys (1981) with a = -0.6 at its tagged position, each field by itself in an interlaced 4:2:0
 // frame; the matrix in floats, rounded once. Packed row by row, while a row is in the cache.
-// Errors: std::bad_alloc; std::runtime_error where zimg refuses the colours.
+// Progressive 4:2:0 of 8 bits goes by Yuv420, to the same samples. Errors: std::bad_alloc;
+// std::runtime_error where zimg refuses the colours.
 class PlanarYuv {
  public:
   // Frames of whole chroma samples in this machine's byte order.
