@@ -34,6 +34,21 @@ ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int
   return model;
 }
 
+LumaWeights WeightsOf(AVColorSpace matrix) {
+  switch (matrix) {
+    case AVCOL_SPC_BT709:
+      return {0.2126, 0.0722};
+    case AVCOL_SPC_FCC:
+      return {0.30, 0.11};
+    case AVCOL_SPC_SMPTE240M:
+      return {0.212, 0.087};
+    case AVCOL_SPC_BT2020_NCL:
+      return {0.2627, 0.0593};
+    default:
+      return {0.299, 0.114};
+  }
+}
+
 bool IsYuv(const AVPixFmtDescriptor& layout) {
   return layout.nb_components >= 3 &&
          !(layout.flags & (AV_PIX_FMT_FLAG_RGB | AV_PIX_FMT_FLAG_PAL | AV_PIX_FMT_FLAG_FLOAT |

@@ -16,6 +16,12 @@ struct ColourModel {
 // width, height: of the clip; BT.709 from 720 lines or 1280 columns on, BT.601 below.
 ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int height);
 
+// Luma weights, ITU-R BT.601, BT.709, BT.2020 and older ones. Those of green are the rest.
+struct LumaWeights {
+  double red, blue;
+};
+LumaWeights WeightsOf(AVColorSpace matrix);
+
 // Luma and two planes or components of chroma, in whole numbers.
 bool IsYuv(const AVPixFmtDescriptor& layout);
 

@@ -13,25 +13,6 @@ namespace {
 
 constexpr int kTurnTile = 16;  // pixels; two tiles of the widest pixel fit in the first-level cache
 
-// Luma weights, ITU-R BT.601, BT.709, BT.2020 and older ones.
-struct LumaWeights {
-  double red, blue;
-};
-LumaWeights WeightsOf(AVColorSpace matrix) {
-  switch (matrix) {
-    case AVCOL_SPC_BT709:
-      return {0.2126, 0.0722};
-    case AVCOL_SPC_FCC:
-      return {0.30, 0.11};
-    case AVCOL_SPC_SMPTE240M:
-      return {0.212, 0.087};
-    case AVCOL_SPC_BT2020_NCL:
-      return {0.2627, 0.0593};
-    default:
-      return {0.299, 0.114};
-  }
-}
-
 int SwscaleMatrix(AVColorSpace matrix) {
   switch (matrix) {
     case AVCOL_SPC_BT709:

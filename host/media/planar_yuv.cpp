@@ -186,8 +186,21 @@ void PlanarYuv::Process(const AVFrame& frame, const ColourModel& model, Byte* pi
   }
 }
 
+Yuv420* PlanarYuv::Own(const AVFrame& frame, const ColourModel& model) {
+  const auto format = static_cast<AVPixelFormat>(frame.format);
+  if (!Yuv420::Takes(format, frame.width, frame.height) ||
+      ByFields(model, *NotNull(av_pix_fmt_desc_get(format)), frame.height)) {
+    return nullptr;
+  }
+  if (!own_ || !own_->Fits(frame.width, frame.height, model)) {
+    own_.emplace(frame.width, frame.height, model);
+  }
+  return &*own_;
+}
+
 void PlanarYuv::ToPixels(const AVFrame& frame, const ColourModel& model, HX_Pixel8* pixels,
                          std::ptrdiff_t row_bytes) {
+  if (Yuv420* own = Own(frame, model)) return own->ToPixels(frame, pixels, row_bytes);
   const AVFrame* from = &frame;
   if (!Aligned(frame)) {
     // A decoder may hand out its frame from a cropped corner on.
@@ -200,6 +213,7 @@ void PlanarYuv::ToPixels(const AVFrame& frame, const ColourModel& model, HX_Pixe
 
 void PlanarYuv::FromPixels(const HX_Pixel8* pixels, std::ptrdiff_t row_bytes,
                            const ColourModel& model, AVFrame& frame) {
+  if (Yuv420* own = Own(frame, model)) return own->FromPixels(pixels, row_bytes, frame);
   Process(frame, model, reinterpret_cast<const std::uint8_t*>(pixels), row_bytes);
 }
 

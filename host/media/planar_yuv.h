@@ -5,10 +5,12 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <vector>
 
 #include "host/media/colour_model.h"
 #include "host/media/ffmpeg.h"
+#include "host/media/yuv420.h"
 #include "platform/hx/hx_pixel.h"
 
 namespace calmframe::media {
@@ -16,7 +18,8 @@ namespace calmframe::media {
 // Planar YUV of 8 to 16 bits to pixels of 8 bits and back, by zimg: chroma by the bicubic of
 // Keys (1981) with a = -0.6 at its tagged position, each field by itself in an interlaced 4:2:0
 // frame; the matrix in floats, rounded once. Packed row by row, while a row is in the cache.
-// Errors: std::bad_alloc; std::runtime_error where zimg refuses the colours.
+// Progressive 4:2:0 of 8 bits goes by Yuv420, to the same samples. Errors: std::bad_alloc;
+// std::runtime_error where zimg refuses the colours.
 class PlanarYuv {
  public:
   // Frames of whole chroma samples in this machine's byte order.
@@ -50,10 +53,13 @@ class PlanarYuv {
   void Process(const AVFrame& frame, const ColourModel& model, Byte* pixels,
                std::ptrdiff_t row_bytes);
   std::uint8_t* Memory(std::size_t bytes);
+  // Null where the frame is zimg's.
+  Yuv420* Own(const AVFrame& frame, const ColourModel& model);
 
   Graph graphs_[3];  // whole frame, top field, bottom field
   std::vector<std::uint8_t> memory_;
   FramePtr aligned_;
+  std::optional<Yuv420> own_;
 };
 
 }  // namespace calmframe::media

@@ -2,11 +2,10 @@
 
 #include <gtest/gtest.h>
 
-#define HWY_BROKEN_EMU128 0  // as the kernels have it
-#include <hwy/highway.h>
-
 #include <random>
 #include <vector>
+
+#include "tests/media/instruction_sets.h"
 
 namespace calmframe::media {
 namespace {
@@ -20,18 +19,6 @@ Bytes Random(std::size_t size) {
   Bytes bytes(size);
   for (std::uint8_t& byte : bytes) byte = static_cast<std::uint8_t>(random());
   return bytes;
-}
-
-void OnEachInstructionSet(const auto& check) {
-  const std::int64_t supported = hwy::SupportedTargets() & HWY_TARGETS;
-  for (std::int64_t left = supported; left != 0; left &= left - 1) {
-    SCOPED_TRACE(hwy::TargetName(left & -left));
-    hwy::SetSupportedTargetsForTest(left & -left);
-    hwy::GetChosenTarget().Update(left & -left);
-    check();
-  }
-  hwy::SetSupportedTargetsForTest(0);
-  hwy::GetChosenTarget().Update(hwy::SupportedTargets());
 }
 
 // Rows of less than a vector, of whole ones and of rests, at odd addresses.
