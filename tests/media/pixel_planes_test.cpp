@@ -23,7 +23,7 @@ Bytes Random(std::size_t size) {
 
 // Rows of less than a vector, of whole ones and of rests, at odd addresses.
 TEST(PixelPlanes, EachInstructionSetPacksAndUnpacksAsThePlainLoopDoes) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     for (const std::size_t count : {0, 1, 2, 15, 16, 17, 33, 63, 64, 65, 127, 128, 203}) {
       for (const bool has_alpha : {false, true}) {
         SCOPED_TRACE(testing::Message() << count << (has_alpha ? " with" : " without") << " alpha");
@@ -61,7 +61,7 @@ TEST(PixelPlanes, EachInstructionSetPacksAndUnpacksAsThePlainLoopDoes) {
 }
 
 TEST(PixelPlanes, EveryColourOverBlackWithEveryAlpha) {
-  OnEachInstructionSet([] {
+  tests::OnEachInstructionSet([] {
     for (int alpha = 0; alpha < 256; ++alpha) {
       Bytes pixels;
       for (int value = 0; value < 256; ++value) {

@@ -125,7 +125,7 @@ TEST_P(Yuv420Test, PixelsAreTheReferenceRounded) {
         planes[p], c_.width, c_.height, [&](int x) { return (x - c_.right) / 2; },
         [&](int y) { return (y - c_.down) / 2; });
   }
-  OnEachInstructionSet([&] {
+  tests::OnEachInstructionSet([&] {
     Yuv420 converter(c_.width, c_.height, model_);
     // A pixel more in each row, which stays.
     std::vector<HX_Pixel8> pixels((c_.width + 1) * c_.height, {1, 2, 3, 4});
@@ -169,7 +169,7 @@ TEST_P(Yuv420Test, CodeWordsAreTheReferenceRounded) {
         *plane, c_.width / 2, c_.height / 2, [&](int x) { return 2 * x + c_.right; },
         [&](int y) { return 2 * y + c_.down; });
   }
-  OnEachInstructionSet([&] {
+  tests::OnEachInstructionSet([&] {
     Yuv420 converter(c_.width, c_.height, model_);
     const FramePtr frame = NewPicture(AV_PIX_FMT_YUV420P, c_.width, c_.height);
     converter.FromPixels(pixels.data(), c_.width * 4, *frame);

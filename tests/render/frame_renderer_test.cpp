@@ -1,7 +1,6 @@
 #include "stabilizer/render/frame_renderer.h"
 
 #include <gtest/gtest.h>
-#include <hwy/highway.h>
 #include <tbb/global_control.h>
 
 #include <boost/make_shared.hpp>
@@ -11,6 +10,7 @@
 #include <random>
 
 #include "tests/render/plain_operations.h"
+#include "tests/support/each_instruction_set.h"
 
 using marrow::stabilization::frame_bounds;
 using marrow::stabilization::inverse;
@@ -376,20 +376,14 @@ TYPED_TEST(FrameRenderer, InstructionSetNeverShows) {
     RenderSettings settings;
     settings.framing = Framing::stabilize_only;
     std::vector<unsigned char> first;
-    const std::int64_t supported = hwy::SupportedTargets() & HWY_TARGETS;
-    for (std::int64_t left = supported; left != 0; left &= left - 1) {
-      SCOPED_TRACE(hwy::TargetName(left & -left));
-      hwy::SetSupportedTargetsForTest(left & -left);
-      hwy::GetChosenTarget().Update(left & -left);
+    tests::OnEachInstructionSet([&] {
       WorldX<TypeParam> out(R.planeWidth, R.planeHeight);
       renderFrame<TypeParam>(clip, nullptr, settings, R, 0, frames, operations, out);
       const auto* bytes = reinterpret_cast<const unsigned char*>(out.data());
       const std::vector<unsigned char> drawn(bytes, bytes + out.row_bytes() * out.height());
       if (first.empty()) first = drawn;
       EXPECT_TRUE(drawn == first);
-    }
-    hwy::SetSupportedTargetsForTest(0);
-    hwy::GetChosenTarget().Update(hwy::SupportedTargets());
+    });
   }
 }
 
