@@ -13,6 +13,9 @@ namespace {
 constexpr std::size_t kBufferSize = 1 << 15;
 // Deflate's best: 258 bytes from two bits.
 constexpr std::uint64_t kMaxRatio = 1032;
+// Of a track table deflate's default saves another 4 % in four times the time, which whoever saves
+// waits for.
+constexpr int kLevel = 4;
 
 uInt Piece(std::size_t size) {
   return static_cast<uInt>(std::min<std::size_t>(size, std::numeric_limits<uInt>::max()));
@@ -22,7 +25,7 @@ uInt Piece(std::size_t size) {
 
 struct OZipByteStream::State {
   explicit State(OutputByteStream& o) : out(o) {
-    if (deflateInit(&zip, Z_DEFAULT_COMPRESSION) != Z_OK) throw std::bad_alloc();
+    if (deflateInit(&zip, kLevel) != Z_OK) throw std::bad_alloc();
   }
   ~State() { deflateEnd(&zip); }
 
