@@ -20,8 +20,6 @@ namespace sampling {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
-// A vector holds one channel of as many pixels as it has lanes, so that opaque pixels need no work
-// for their alpha and weights no spreading over channels.
 using DF = hn::CappedTag<float, 16>;
 using DU = hn::RebindToUnsigned<DF>;
 using DI = hn::RebindToSigned<DF>;
@@ -29,6 +27,7 @@ using D64 = hn::Repartition<std::uint64_t, DF>;
 using DOffset = hn::RebindToSigned<D64>;
 using VF = hn::Vec<DF>;
 using VU = hn::Vec<DU>;
+using VI = hn::Vec<DI>;
 using VOffset = hn::Vec<DOffset>;
 using Mask = hn::Mask<DF>;
 
@@ -189,18 +188,27 @@ HWY_INLINE bool Corners(const source_plane& source, const std::int32_t* ix, cons
 }
 
 // The whole part of 0 <= v < 2^31.
-HWY_INLINE hn::Vec<DI> Whole(VF v) {
+HWY_INLINE VI Whole(VF v) {
 #if HWY_ARCH_X86 && HWY_TARGET <= HWY_AVX3  // the library's also looks for what is out of range
-  return hn::Vec<DI>{_mm512_cvttps_epi32(v.raw)};
+  return VI{_mm512_cvttps_epi32(v.raw)};
 #elif HWY_TARGET == HWY_AVX2
-  return hn::Vec<DI>{_mm256_cvttps_epi32(v.raw)};
+  return VI{_mm256_cvttps_epi32(v.raw)};
 #else
   return hn::ConvertTo(DI(), v);
 #endif
 }
 
-HWY_INLINE VF Rounded(VF v) {  // 0 <= v < 2^31
-  return hn::ConvertTo(DF(), Whole(hn::Add(v, hn::Set(DF(), 0.5f))));
+// The whole part of 0 <= v < 2^31, as a float.
+HWY_INLINE VF Truncated(VF v) {
+#if HWY_ARCH_X86 && HWY_TARGET > HWY_SSE4  // has no instruction for it
+  return hn::ConvertTo(DF(), Whole(v));
+#else
+  return hn::Floor(v);
+#endif
+}
+
+HWY_INLINE VF PlusHalf(VF v) {
+  return hn::Add(v, hn::Set(DF(), 0.5f));
 }
 
 HWY_INLINE VU Bits(VF whole) {
@@ -211,128 +219,15 @@ HWY_INLINE VF Lanes(VU v) {
   return hn::ConvertTo(DF(), hn::BitCast(DI(), v));
 }
 
-// A depth: how neighbours are read into raw channels, up to four vectors a pixel, how these become
-// f32 and how samples are written. Channel 0 is alpha.
-struct Depth8 {
-  using Pixel = HX_Pixel8;
-  static constexpr bool rounds = true;
-  static HWY_INLINE void Load(const unsigned char* p, VOffset lower, VOffset upper, VU& left, VU&,
-                              VU&, VU&, VU& right, VU&, VU&, VU&) {
-    Words(p, lower, upper, left, right);
-  }
-  template <int channel>
-  static HWY_INLINE VF Channel(VU r0, VU, VU, VU) {
-    if constexpr (channel == 3) return Lanes(hn::ShiftRight<24>(r0));
-    return Lanes(hn::And(hn::ShiftRight<8 * channel>(r0), hn::Set(DU(), 255)));
-  }
-  static HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU d) {
-    const auto differ = hn::Or(hn::Xor(a, b), hn::Or(hn::Xor(a, c), hn::Xor(a, d)));
-    return hn::AllTrue(DU(), hn::Eq(hn::And(differ, hn::Set(DU(), 255)), hn::Zero(DU())));
-  }
-  // The samples of pixels with one alpha for all four corners. Red and green are not
-  // shifted down: as 2^8 and 2^16 of themselves, with weights as much smaller, they make the very
-  // same products.
-  static HWY_INLINE void StoreOneAlpha(VU a, VU b, VU c, VU e, VF sx, VF tx, VF sy, VF ty,
-                                       unsigned char* out) {
-    const DF d;
-    const auto between = [&](VF p, VF q, VF s, VF t) HWY_ATTR {
-      const auto v = hn::Add(hn::Mul(p, s), hn::Mul(q, t));
-      return Whole(hn::Add(v, hn::Set(d, 0.5f)));
-    };
-    const auto sample = [&](const auto& channel, VF s, VF t) HWY_ATTR {
-      const auto left = hn::ConvertTo(d, between(channel(a), channel(c), s, t));
-      const auto right = hn::ConvertTo(d, between(channel(b), channel(e), s, t));
-      return hn::BitCast(DU(), between(left, right, sx, tx));
-    };
-    const auto down8 = hn::Set(d, 1.0f / 256), down16 = hn::Set(d, 1.0f / 65536);
-    const auto red = sample([](VU v) HWY_ATTR { return Lanes(hn::And(v, hn::Set(DU(), 0xFF00))); },
-                            hn::Mul(sy, down8), hn::Mul(ty, down8));
-    const auto green =
-        sample([](VU v) HWY_ATTR { return Lanes(hn::And(v, hn::Set(DU(), 0xFF0000))); },
-               hn::Mul(sy, down16), hn::Mul(ty, down16));
-    const auto blue = sample([](VU v) HWY_ATTR { return Lanes(hn::ShiftRight<24>(v)); }, sy, ty);
-    const auto alpha = hn::And(a, hn::Set(DU(), 255));
-    const auto packed = hn::Or(hn::Or(alpha, hn::ShiftLeft<8>(red)),
-                               hn::Or(hn::ShiftLeft<16>(green), hn::ShiftLeft<24>(blue)));
-    const auto shown = hn::IfThenZeroElse(hn::Eq(alpha, hn::Zero(DU())), packed);
-    const hn::Repartition<std::uint8_t, DF> bytes;
-    hn::StoreU(hn::BitCast(bytes, shown), bytes, out);
-  }
-  static HWY_INLINE void Store(VF alpha, VF red, VF green, VF blue, unsigned char* out) {
-    // What lies above a channel's bits is shifted out or covered.
-    const auto upper = hn::Or(hn::ShiftLeft<16>(Bits(green)), hn::ShiftLeft<24>(Bits(blue)));
-    const auto lower = hn::Or(hn::And(Bits(alpha), hn::Set(DU(), 255)),
-                              hn::ShiftRight<16>(hn::ShiftLeft<24>(Bits(red))));
-    const hn::Repartition<std::uint8_t, DF> bytes;
-    hn::StoreU(hn::BitCast(bytes, hn::Or(upper, lower)), bytes, out);
-  }
-};
-
-struct Depth16 {
-  using Pixel = HX_Pixel16;
-  static constexpr bool rounds = true;
-  static HWY_INLINE void Load(const unsigned char* p, VOffset lower, VOffset upper, VU& left0,
-                              VU& left1, VU&, VU&, VU& right0, VU& right1, VU&, VU&) {
-    Words(p, lower, upper, left0, left1);
-    Words(p + sizeof(Pixel), lower, upper, right0, right1);
-  }
-  template <int channel>
-  static HWY_INLINE VF Channel(VU r0, VU r1, VU, VU) {
-    const VU r = channel < 2 ? r0 : r1;
-    if constexpr (channel % 2 == 1) return Lanes(hn::ShiftRight<16>(r));
-    return Lanes(hn::And(r, hn::Set(DU(), 65535)));
-  }
-  static HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU d) {
-    const auto differ = hn::Or(hn::Xor(a, b), hn::Or(hn::Xor(a, c), hn::Xor(a, d)));
-    return hn::AllTrue(DU(), hn::Eq(hn::And(differ, hn::Set(DU(), 65535)), hn::Zero(DU())));
-  }
-  static HWY_INLINE void Store(VF alpha, VF red, VF green, VF blue, unsigned char* out) {
-    const auto mask = hn::Set(DU(), 65535);
-    hn::StoreInterleaved2(hn::Or(hn::And(Bits(alpha), mask), hn::ShiftLeft<16>(Bits(red))),
-                          hn::Or(hn::And(Bits(green), mask), hn::ShiftLeft<16>(Bits(blue))), DU(),
-                          reinterpret_cast<std::uint32_t*>(out));
-  }
-};
-
-struct DepthFloat {
-  using Pixel = HX_PixelFloat;
-  static constexpr bool rounds = false;
-  static HWY_INLINE void Load(const unsigned char* p, VOffset lower, VOffset upper, VU& left0,
-                              VU& left1, VU& left2, VU& left3, VU& right0, VU& right1, VU& right2,
-                              VU& right3) {
-    Words(p, lower, upper, left0, left1);
-    Words(p + 8, lower, upper, left2, left3);
-    Words(p + 16, lower, upper, right0, right1);
-    Words(p + 24, lower, upper, right2, right3);
-  }
-  template <int channel>
-  static HWY_INLINE VF Channel(VU r0, VU r1, VU r2, VU r3) {
-    return hn::BitCast(DF(), channel == 0 ? r0 : channel == 1 ? r1 : channel == 2 ? r2 : r3);
-  }
-  static HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU d) {
-    const auto first = hn::BitCast(DF(), a);
-    const auto as_first = [&](VU other)
-                              HWY_ATTR { return hn::Eq(first, hn::BitCast(DF(), other)); };
-    return hn::AllTrue(DF(), hn::And(as_first(b), hn::And(as_first(c), as_first(d))));
-  }
-  static HWY_INLINE void Store(VF alpha, VF red, VF green, VF blue, unsigned char* out) {
-    hn::StoreInterleaved4(alpha, red, green, blue, DF(), reinterpret_cast<float*>(out));
-  }
-};
-
-template <class Depth>
-HWY_INLINE VF Between(VF p, VF q, VF s, VF t) {
-  const auto v = hn::Add(hn::Mul(p, s), hn::Mul(q, t));
-  if constexpr (Depth::rounds) {
-    return Rounded(v);
-  } else {
-    return v;
-  }
+template <bool kRounds>
+HWY_INLINE VF Stored(VF v) {
+  if constexpr (kRounds) v = Truncated(PlusHalf(v));
+  return v;
 }
 
 // The interpolation at t = 1 - s between pixels of the alphas a and b. Where these are equal, what
 // weighs a colour is the fraction alone.
-template <class Depth>
+template <bool kRounds>
 class Weights {
  public:
   HWY_INLINE Weights(VF a, VF b, VF s, VF t)
@@ -344,131 +239,264 @@ class Weights {
     divisor_ = hn::IfThenElse(equal, hn::Set(d, 1.0f), alpha_);
     nothing_ = hn::Eq(alpha_, hn::Zero(d));
   }
-  HWY_INLINE VF Alpha() const { return Stored(alpha_); }
+  HWY_INLINE VF Alpha() const { return Shown(alpha_); }
   HWY_INLINE VF Colour(VF p, VF q) const {
-    return Stored(hn::Div(hn::Add(hn::Mul(p, p_), hn::Mul(q, q_)), divisor_));
+    return Shown(hn::Div(hn::Add(hn::Mul(p, p_), hn::Mul(q, q_)), divisor_));
   }
 
  private:
-  HWY_INLINE VF Stored(VF v) const {
-    if constexpr (Depth::rounds) v = Rounded(v);
-    return hn::IfThenZeroElse(nothing_, v);
-  }
+  HWY_INLINE VF Shown(VF v) const { return hn::IfThenZeroElse(nothing_, Stored<kRounds>(v)); }
 
   VF p_, q_, alpha_, divisor_;
   Mask nothing_;
 };
 
-template <class Depth>
-HWY_INLINE void Sample(const source_plane& source, Stretch& s) {
-  using Pixel = typename Depth::Pixel;
+// Pixels of 8 bits. A vector holds one channel of as many pixels as it has lanes, so that opaque
+// pixels need no work for their alpha and weights no spreading over channels.
+
+template <int channel>
+HWY_INLINE VF Channel(VU pixels) {
+  if constexpr (channel == 3) return Lanes(hn::ShiftRight<24>(pixels));
+  return Lanes(hn::And(hn::ShiftRight<8 * channel>(pixels), hn::Set(DU(), 255)));
+}
+
+HWY_INLINE bool OneAlpha(VU a, VU b, VU c, VU e) {
+  const auto differ = hn::Or(hn::Xor(a, b), hn::Or(hn::Xor(a, c), hn::Xor(a, e)));
+  return hn::AllTrue(DU(), hn::Eq(hn::And(differ, hn::Set(DU(), 255)), hn::Zero(DU())));
+}
+
+// The samples of pixels with one alpha for all four corners. Red and green are not shifted down: as
+// 2^8 and 2^16 of themselves, with weights as much smaller, they make the very same products.
+HWY_INLINE VU SampleOneAlpha(VU a, VU b, VU c, VU e, VF sx, VF tx, VF sy, VF ty) {
   const DF d;
+  const auto between = [&](VF p, VF q, VF s, VF t)
+                           HWY_ATTR { return PlusHalf(hn::Add(hn::Mul(p, s), hn::Mul(q, t))); };
+  const auto sample = [&](const auto& channel, VF s, VF t) HWY_ATTR {
+    const auto left = Truncated(between(channel(a), channel(c), s, t));
+    const auto right = Truncated(between(channel(b), channel(e), s, t));
+    return hn::BitCast(DU(), Whole(between(left, right, sx, tx)));
+  };
+  const auto down8 = hn::Set(d, 1.0f / 256), down16 = hn::Set(d, 1.0f / 65536);
+  const auto red = sample([](VU v) HWY_ATTR { return Lanes(hn::And(v, hn::Set(DU(), 0xFF00))); },
+                          hn::Mul(sy, down8), hn::Mul(ty, down8));
+  const auto green =
+      sample([](VU v) HWY_ATTR { return Lanes(hn::And(v, hn::Set(DU(), 0xFF0000))); },
+             hn::Mul(sy, down16), hn::Mul(ty, down16));
+  const auto blue = sample([](VU v) HWY_ATTR { return Lanes(hn::ShiftRight<24>(v)); }, sy, ty);
+  const auto alpha = hn::And(a, hn::Set(DU(), 255));
+  const auto packed = hn::Or(hn::Or(alpha, hn::ShiftLeft<8>(red)),
+                             hn::Or(hn::ShiftLeft<16>(green), hn::ShiftLeft<24>(blue)));
+  return hn::IfThenZeroElse(hn::Eq(alpha, hn::Zero(DU())), packed);
+}
+
+HWY_INLINE VU SampleWeighted(VU a, VU b, VU c, VU e, VF sx, VF tx, VF sy, VF ty) {
+  const Weights<true> left(Channel<0>(a), Channel<0>(c), sy, ty);
+  const Weights<true> right(Channel<0>(b), Channel<0>(e), sy, ty);
+  const Weights<true> both(left.Alpha(), right.Alpha(), sx, tx);
+  const auto colour = [&](auto i) HWY_ATTR {
+    constexpr int channel = decltype(i)::value;
+    return Bits(both.Colour(left.Colour(Channel<channel>(a), Channel<channel>(c)),
+                            right.Colour(Channel<channel>(b), Channel<channel>(e))));
+  };
+  const auto red = colour(std::integral_constant<int, 1>());
+  const auto green = colour(std::integral_constant<int, 2>());
+  const auto blue = colour(std::integral_constant<int, 3>());
+  // What lies above a channel's bits is shifted out or covered.
+  return hn::Or(hn::Or(hn::ShiftLeft<16>(green), hn::ShiftLeft<24>(blue)),
+                hn::Or(hn::And(Bits(both.Alpha()), hn::Set(DU(), 255)),
+                       hn::ShiftRight<16>(hn::ShiftLeft<24>(red))));
+}
+
+// Corners a b above c e by gathers, wherever they lie.
+HWY_INLINE void GatherCorners(const source_plane& source, VI ix, VI iy, VU& a, VU& b, VU& c,
+                              VU& e) {
   const DI di;
   const DOffset dofs;
   const hn::Half<DI> half;
-  const int lanes = static_cast<int>(hn::Lanes(d));
   const auto row_bytes = hn::Set(di, static_cast<std::int32_t>(source.row_bytes));
-  const auto pixel_bytes = hn::Set(di, static_cast<std::int32_t>(sizeof(Pixel)));
-  const unsigned char* below = source.data + source.row_bytes;
-  // The lanes of the last vector that are left over repeat the last pixel.
-  for (std::int32_t* whole : {s.ix, s.iy}) {
-    hn::StoreU(hn::Set(di, whole[s.count - 1]), di, whole + s.count);
-  }
-  for (float* part : {s.fx, s.fy}) hn::StoreU(hn::Zero(d), d, part + s.count);
+  const auto pixel_bytes = hn::Set(di, static_cast<std::int32_t>(sizeof(HX_Pixel8)));
+  const auto offset = [&](auto x, auto y) HWY_ATTR {
+    const auto bytes = [&](auto v, auto unit) HWY_ATTR {
+      return hn::MulEven(hn::BitCast(di, hn::PromoteTo(dofs, v)), unit);
+    };
+    return hn::Add(bytes(y, row_bytes), bytes(x, pixel_bytes));
+  };
+  const auto lower = offset(hn::LowerHalf(half, ix), hn::LowerHalf(half, iy));
+  const auto upper = offset(hn::UpperHalf(half, ix), hn::UpperHalf(half, iy));
+  Words(source.data, lower, upper, a, b);
+  Words(source.data + source.row_bytes, lower, upper, c, e);
+}
 
+// The lanes of the last vector that are left over repeat the last pixel.
+HWY_INLINE void RepeatLast(Stretch& s) {
+  for (std::int32_t* whole : {s.ix, s.iy}) {
+    hn::StoreU(hn::Set(DI(), whole[s.count - 1]), DI(), whole + s.count);
+  }
+  for (float* part : {s.fx, s.fy}) hn::StoreU(hn::Zero(DF()), DF(), part + s.count);
+}
+
+HWY_INLINE void Sample(const source_plane& source, Stretch& s, HX_Pixel8*) {
+  const DF d;
+  const DI di;
+  const hn::Repartition<std::uint8_t, DF> bytes;
+  const int lanes = static_cast<int>(hn::Lanes(d));
   for (int k = 0; k < s.count; k += lanes) {
-    // Corners a b above c d.
-    VU a0, a1, a2, a3, b0, b1, b2, b3, c0, c1, c2, c3, d0, d1, d2, d3;
-    a0 = a1 = a2 = a3 = b0 = b1 = b2 = b3 = hn::Zero(DU());
-    c0 = c1 = c2 = c3 = d0 = d1 = d2 = d3 = hn::Zero(DU());
-    bool loaded = false;
-    if constexpr (sizeof(Pixel) == 4) {
-      loaded = Corners(source, s.ix + k, s.iy + k, a0, b0, c0, d0);
-    }
-    if (!loaded) {
-      const auto ix = hn::Load(di, s.ix + k), iy = hn::Load(di, s.iy + k);
-      const auto offset = [&](auto x, auto y) HWY_ATTR {
-        const auto bytes = [&](auto v, auto unit) HWY_ATTR {
-          return hn::MulEven(hn::BitCast(di, hn::PromoteTo(dofs, v)), unit);
-        };
-        return hn::Add(bytes(y, row_bytes), bytes(x, pixel_bytes));
-      };
-      const auto lower = offset(hn::LowerHalf(half, ix), hn::LowerHalf(half, iy));
-      const auto upper = offset(hn::UpperHalf(half, ix), hn::UpperHalf(half, iy));
-      Depth::Load(source.data, lower, upper, a0, a1, a2, a3, b0, b1, b2, b3);
-      Depth::Load(below, lower, upper, c0, c1, c2, c3, d0, d1, d2, d3);
+    VU a, b, c, e;
+    if (!Corners(source, s.ix + k, s.iy + k, a, b, c, e)) {
+      GatherCorners(source, hn::Load(di, s.ix + k), hn::Load(di, s.iy + k), a, b, c, e);
     }
     const auto tx = hn::Load(d, s.fx + k), ty = hn::Load(d, s.fy + k);
     const auto sx = hn::Sub(hn::Set(d, 1.0f), tx), sy = hn::Sub(hn::Set(d, 1.0f), ty);
-
-    unsigned char* out = s.out + static_cast<std::ptrdiff_t>(sizeof(Pixel)) * k;
-    HWY_ALIGN unsigned char rest[max_lanes * sizeof(Pixel)];
-    unsigned char* to = k + lanes <= s.count ? out : rest;
-    VF red, green, blue;
-    const auto of_channels = [&](const auto& sample) HWY_ATTR {
-      const auto channel = [&](auto i) HWY_ATTR {
-        return sample(
-            Depth::template Channel<i>(a0, a1, a2, a3), Depth::template Channel<i>(b0, b1, b2, b3),
-            Depth::template Channel<i>(c0, c1, c2, c3), Depth::template Channel<i>(d0, d1, d2, d3));
-      };
-      red = channel(std::integral_constant<int, 1>());
-      green = channel(std::integral_constant<int, 2>());
-      blue = channel(std::integral_constant<int, 3>());
-    };
-    if (!Depth::OneAlpha(a0, b0, c0, d0)) {
-      const Weights<Depth> left(Depth::template Channel<0>(a0, a1, a2, a3),
-                                Depth::template Channel<0>(c0, c1, c2, c3), sy, ty);
-      const Weights<Depth> right(Depth::template Channel<0>(b0, b1, b2, b3),
-                                 Depth::template Channel<0>(d0, d1, d2, d3), sy, ty);
-      const Weights<Depth> both(left.Alpha(), right.Alpha(), sx, tx);
-      of_channels([&](VF a, VF b, VF c, VF e)
-                      HWY_ATTR { return both.Colour(left.Colour(a, c), right.Colour(b, e)); });
-      Depth::Store(both.Alpha(), red, green, blue, to);
-    } else if constexpr (std::is_same_v<Depth, Depth8>) {
-      Depth::StoreOneAlpha(a0, b0, c0, d0, sx, tx, sy, ty, to);
+    const auto sample =
+        hn::BitCast(bytes, OneAlpha(a, b, c, e) ? SampleOneAlpha(a, b, c, e, sx, tx, sy, ty)
+                                                : SampleWeighted(a, b, c, e, sx, tx, sy, ty));
+    unsigned char* out = s.out + std::ptrdiff_t{4} * k;
+    if (k + lanes <= s.count) {
+      hn::StoreU(sample, bytes, out);
     } else {
-      const auto sample = [&](VF a, VF b, VF c, VF e) HWY_ATTR {
-        return Between<Depth>(Between<Depth>(a, c, sy, ty), Between<Depth>(b, e, sy, ty), sx, tx);
-      };
-      of_channels(sample);
-      auto alpha = Depth::template Channel<0>(a0, a1, a2, a3);
-      const auto nothing = hn::Eq(alpha, hn::Zero(d));
-      if constexpr (!Depth::rounds) alpha = sample(alpha, alpha, alpha, alpha);
-      const auto shown = [&](VF v) HWY_ATTR { return hn::IfThenZeroElse(nothing, v); };
-      Depth::Store(shown(alpha), shown(red), shown(green), shown(blue), to);
-    }
-    if (to == rest) {
-      std::memcpy(out, rest, sizeof(Pixel) * static_cast<std::size_t>(s.count - k));
+      HWY_ALIGN unsigned char rest[4 * max_lanes];
+      hn::Store(sample, bytes, rest);
+      std::memcpy(out, rest, std::size_t{4} * static_cast<std::size_t>(s.count - k));
     }
   }
-  s.count = 0;
 }
 
-template <class Depth>
-HWY_INLINE void Runs(const source_plane& source, const source_run<typename Depth::Pixel>* runs,
-                     std::size_t n) {
+// Deeper pixels. A vector holds the four channels of a few pixels as they lie in memory: pixels
+// that neighbour each other come in one load, where gathers would fetch each by itself.
+
+constexpr int group = static_cast<int>(hn::MaxLanes(DF())) / 4;  // pixels of a vector
+
+HWY_INLINE VF LoadFloats(const unsigned char* pixels, HX_PixelFloat*) {
+  const hn::Repartition<std::uint8_t, DF> bytes;
+  return hn::BitCast(DF(), hn::LoadU(bytes, pixels));
+}
+
+HWY_INLINE VF LoadFloats(const unsigned char* pixels, HX_Pixel16*) {
+  const hn::Rebind<std::uint16_t, DF> words;
+  const hn::Repartition<std::uint8_t, decltype(words)> bytes;
+  const auto raw = hn::BitCast(words, hn::LoadU(bytes, pixels));
+  return hn::ConvertTo(DF(), hn::PromoteTo(DI(), raw));
+}
+
+HWY_INLINE void StoreFloats(VF v, unsigned char* pixels, HX_PixelFloat*) {
+  const hn::Repartition<std::uint8_t, DF> bytes;
+  hn::StoreU(hn::BitCast(bytes, v), bytes, pixels);
+}
+
+HWY_INLINE void StoreFloats(VF v, unsigned char* pixels, HX_Pixel16*) {
+  const hn::Rebind<std::uint16_t, DF> words;
+  const hn::Repartition<std::uint8_t, decltype(words)> bytes;
+  hn::StoreU(hn::BitCast(bytes, hn::DemoteTo(words, Whole(v))), bytes, pixels);
+}
+
+template <class Pixel>
+HWY_INLINE void Sample(const source_plane& source, Stretch& s, Pixel* kind) {
+  constexpr bool kRounds = std::is_same_v<Pixel, HX_Pixel16>;
+  constexpr std::ptrdiff_t kBytes = sizeof(Pixel);
+  const DF d;
+  const DI di;
+  const DU du;
+  const hn::CappedTag<std::int32_t, group> dgroup;
+  // Lane 4 j + i is channel i of pixel j.
+  const auto lane = hn::Iota(du, 0);
+  const auto channel = hn::And(lane, hn::Set(du, 3));
+  const auto of_pixel = hn::IndicesFromVec(d, hn::ShiftRight<2>(lane));
+  const auto alpha_lanes = hn::RebindMask(d, hn::Eq(channel, hn::Zero(du)));
+  const auto spread = [&](VF of_pixels)
+                          HWY_ATTR { return hn::TableLookupLanes(of_pixels, of_pixel); };
+
+  for (int k = 0; k < s.count; k += group) {
+    const std::int32_t* ix = s.ix + k;
+    const std::int32_t* iy = s.iy + k;
+    VF a, b, c, e;  // corners a b above c e
+    const auto place = hn::Sub(hn::LoadU(dgroup, ix), hn::Set(dgroup, ix[0]));
+    const auto strays = hn::Or(hn::AndNot(hn::Set(dgroup, group - 1), place),
+                               hn::Xor(hn::LoadU(dgroup, iy), hn::Set(dgroup, iy[0])));
+    if (ix[0] + group < source.width && hn::AllTrue(dgroup, hn::Eq(strays, hn::Zero(dgroup)))) {
+      const unsigned char* p = source.data + iy[0] * source.row_bytes + ix[0] * kBytes;
+      const auto places = hn::BitCast(d, hn::Sub(hn::LoadU(di, ix), hn::Set(di, ix[0])));
+      const auto from = hn::IndicesFromVec(
+          d, hn::Add(hn::ShiftLeft<2>(hn::BitCast(du, spread(places))), channel));
+      const auto at = [&](const unsigned char* pixels)
+                          HWY_ATTR { return hn::TableLookupLanes(LoadFloats(pixels, kind), from); };
+      a = at(p);
+      b = at(p + kBytes);
+      c = at(p + source.row_bytes);
+      e = at(p + source.row_bytes + kBytes);
+    } else {
+      HWY_ALIGN unsigned char corners[4][group * kBytes];
+      for (int j = 0; j < group; ++j) {
+        const unsigned char* p = source.data + iy[j] * source.row_bytes + ix[j] * kBytes;
+        std::memcpy(corners[0] + j * kBytes, p, kBytes);
+        std::memcpy(corners[1] + j * kBytes, p + kBytes, kBytes);
+        std::memcpy(corners[2] + j * kBytes, p + source.row_bytes, kBytes);
+        std::memcpy(corners[3] + j * kBytes, p + source.row_bytes + kBytes, kBytes);
+      }
+      a = LoadFloats(corners[0], kind);
+      b = LoadFloats(corners[1], kind);
+      c = LoadFloats(corners[2], kind);
+      e = LoadFloats(corners[3], kind);
+    }
+    const auto tx = spread(hn::LoadU(d, s.fx + k)), ty = spread(hn::LoadU(d, s.fy + k));
+    const auto sx = hn::Sub(hn::Set(d, 1.0f), tx), sy = hn::Sub(hn::Set(d, 1.0f), ty);
+
+    // Where the four alphas of each pixel are one, and not 0, no weight depends on them.
+    const auto one =
+        hn::And(hn::And(hn::Eq(a, b), hn::Eq(a, c)), hn::And(hn::Eq(a, e), hn::Ne(a, hn::Zero(d))));
+    VF sample;
+    if (hn::AllFalse(d, hn::AndNot(one, alpha_lanes))) {
+      const auto between = [](VF p, VF q, VF s_, VF t)
+                               HWY_ATTR { return hn::Add(hn::Mul(p, s_), hn::Mul(q, t)); };
+      sample = between(Stored<kRounds>(between(a, c, sy, ty)),
+                       Stored<kRounds>(between(b, e, sy, ty)), sx, tx);
+      if constexpr (kRounds) sample = PlusHalf(sample);  // storing truncates
+    } else {
+      const auto mixed = [&](VF p, VF q, VF s_, VF t) HWY_ATTR {
+        const Weights<kRounds> weights(hn::Broadcast<0>(p), hn::Broadcast<0>(q), s_, t);
+        return hn::IfThenElse(alpha_lanes, weights.Alpha(), weights.Colour(p, q));
+      };
+      sample = mixed(mixed(a, c, sy, ty), mixed(b, e, sy, ty), sx, tx);
+    }
+    unsigned char* out = s.out + kBytes * k;
+    if (k + group <= s.count) {
+      StoreFloats(sample, out, kind);
+    } else {
+      HWY_ALIGN unsigned char rest[group * kBytes];
+      StoreFloats(sample, rest, kind);
+      std::memcpy(out, rest, static_cast<std::size_t>(kBytes * (s.count - k)));
+    }
+  }
+}
+
+template <class Pixel>
+HWY_INLINE void Runs(const source_plane& source, const source_run<Pixel>* runs, std::size_t n) {
   Stretch s;
-  const typename Depth::Pixel* end = nullptr;
+  Pixel* end = nullptr;
+  const auto sample = [&] HWY_ATTR {
+    RepeatLast(s);
+    Sample(source, s, end);
+    s.count = 0;
+  };
   for (std::size_t i = 0; i < n; ++i) {
     const auto& run = runs[i];
     if (s.count > 0 && (run.out != end || s.count + run.count > max_stretch)) {
-      Sample<Depth>(source, s);
+      sample();
     }
     if (s.count == 0) s.out = reinterpret_cast<unsigned char*>(run.out);
     Locate(source, run, s);
     end = run.out + run.count;
   }
-  if (s.count > 0) Sample<Depth>(source, s);
+  if (s.count > 0) sample();
 }
 
 void Runs8(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n) {
-  Runs<Depth8>(source, runs, n);
+  Runs(source, runs, n);
 }
 void Runs16(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n) {
-  Runs<Depth16>(source, runs, n);
+  Runs(source, runs, n);
 }
 void RunsFloat(const source_plane& source, const source_run<HX_PixelFloat>* runs, std::size_t n) {
-  Runs<DepthFloat>(source, runs, n);
+  Runs(source, runs, n);
 }
 
 }  // namespace HWY_NAMESPACE
