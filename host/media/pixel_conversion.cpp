@@ -6,6 +6,7 @@
 #include <thread>
 #include <type_traits>
 
+#include "host/media/deep_yuv.h"
 #include "host/media/pixel_planes.h"
 
 namespace calmframe::media {
@@ -63,44 +64,11 @@ constexpr float kUnit = std::is_same_v<Pixel, HX_Pixel8>    ? 1.0f / 255
                         : std::is_same_v<Pixel, HX_Pixel16> ? 1.0f / 32768
                                                             : 1.0f;
 
-// Scale and offset of YUV in 16 bits: code words of `depth` bits shifted up.
-struct CodeScale {
-  CodeScale(bool full_range, int depth)
-      : top(static_cast<float>(((1 << depth) - 1) << (16 - depth))),
-        luma(full_range ? top : 219.0f * 256),
-        chroma(full_range ? top : 224.0f * 256),
-        black(full_range ? 0.0f : 16.0f * 256) {}
-  float top, luma, chroma, black;
-};
-
-template <class Pixel>
-void FromYuv16(const AVFrame& yuv, const ColourModel& model, int depth, bool alpha, Pixel* pixels,
-               std::ptrdiff_t row_bytes) {
-  const LumaWeights weights = WeightsOf(model.matrix);
-  const CodeScale scale(model.full_range, depth);
-  const auto red_v = static_cast<float>(2 * (1 - weights.red));
-  const auto blue_u = static_cast<float>(2 * (1 - weights.blue));
-  const double green = 1 - weights.red - weights.blue;
-  const auto green_v = static_cast<float>(weights.red / green) * red_v;
-  const auto green_u = static_cast<float>(weights.blue / green) * blue_u;
-  for (int row = 0; row < yuv.height; ++row) {
-    const auto plane = [&](int p) {
-      return reinterpret_cast<const std::uint16_t*>(yuv.data[p] +
-                                                    std::ptrdiff_t{row} * yuv.linesize[p]);
-    };
-    const std::uint16_t* luma = plane(0);
-    const std::uint16_t* cb = plane(1);
-    const std::uint16_t* cr = plane(2);
-    const std::uint16_t* opacity = alpha ? plane(3) : nullptr;
-    Pixel* out = Row(pixels, row_bytes, row);
-    for (int x = 0; x < yuv.width; ++x) {
-      const float y = (static_cast<float>(luma[x]) - scale.black) / scale.luma;
-      const float u = (static_cast<float>(cb[x]) - 32768.0f) / scale.chroma;
-      const float v = (static_cast<float>(cr[x]) - 32768.0f) / scale.chroma;
-      out[x] = FromUnit<Pixel>(opacity ? static_cast<float>(opacity[x]) / scale.top : 1.0f,
-                               y + red_v * v, y - green_u * u - green_v * v, y + blue_u * u);
-    }
-  }
+// The row of a frame's plane of 16 bits, or null.
+std::uint16_t* Row16(const AVFrame& frame, int plane, int y) {
+  return frame.data[plane]
+             ? Row(reinterpret_cast<std::uint16_t*>(frame.data[plane]), frame.linesize[plane], y)
+             : nullptr;
 }
 
 // RGB, palette and grey of any integer depth, read component by component, exactly.
@@ -292,7 +260,12 @@ void FrameToPixels::ConvertStored(const AVFrame& frame, Pixel* pixels, std::ptrd
     AVFrame& planes = Reuse(planes_, alpha ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16,
                             frame.width, frame.height);
     scaler_.Scale(frame, planes, model);
-    FromYuv16(planes, model, layout.comp[0].depth, alpha, pixels, row_bytes);
+    const DeepYuv yuv(model, layout.comp[0].depth);
+    for (int y = 0; y < frame.height; ++y) {
+      yuv.ToPixels(
+          {Row16(planes, 0, y), Row16(planes, 1, y), Row16(planes, 2, y), Row16(planes, 3, y)},
+          static_cast<std::size_t>(frame.width), Row(pixels, row_bytes, y));
+    }
   }
 }
 
@@ -387,42 +360,17 @@ FramePtr PixelsToFrame::Convert(const Pixel* pixels, std::ptrdiff_t row_bytes) {
     scaler_.Scale(argb, *frame, model_);
     return frame;
   }
-  AVFrame& yuv =
-      Reuse(planes_, alpha ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16, width_, height_);
-  const LumaWeights weights = WeightsOf(model_.matrix);
-  const auto kr = static_cast<float>(weights.red);
-  const auto kb = static_cast<float>(weights.blue);
-  const CodeScale scale(model_.full_range, std::min(layout.comp[0].depth, 16));
-  const auto code = [](float value) {
-    return static_cast<std::uint16_t>(std::min(std::max(value, 0.0f), 65535.0f) + 0.5f);
-  };
-  for (int row = 0; row < height_; ++row) {
-    const Pixel* in = Row(pixels, row_bytes, row);
-    const auto plane = [&](int p) {
-      return reinterpret_cast<std::uint16_t*>(yuv.data[p] + std::ptrdiff_t{row} * yuv.linesize[p]);
-    };
-    std::uint16_t* luma = plane(0);
-    std::uint16_t* cb = plane(1);
-    std::uint16_t* cr = plane(2);
-    for (int x = 0; x < width_; ++x) {
-      const float gain = opacity(in[x]) * kUnit<Pixel>;
-      const auto unit = [gain](auto value) {
-        return std::min(std::max(static_cast<float>(value) * gain, 0.0f), 1.0f);
-      };
-      const float red = unit(in[x].red);
-      const float blue = unit(in[x].blue);
-      const float y = kr * red + (1 - kr - kb) * unit(in[x].green) + kb * blue;
-      luma[x] = code(scale.black + scale.luma * y);
-      cb[x] = code(32768.0f + scale.chroma * (blue - y) / (2 * (1 - kb)));
-      cr[x] = code(32768.0f + scale.chroma * (red - y) / (2 * (1 - kr)));
+  if constexpr (!std::is_same_v<Pixel, HX_Pixel8>) {
+    AVFrame& planes =
+        Reuse(planes_, alpha ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16, width_, height_);
+    const DeepYuv yuv(model_, std::min(layout.comp[0].depth, 16));
+    for (int y = 0; y < height_; ++y) {
+      yuv.FromPixels(
+          Row(pixels, row_bytes, y), static_cast<std::size_t>(width_),
+          {Row16(planes, 0, y), Row16(planes, 1, y), Row16(planes, 2, y), Row16(planes, 3, y)});
     }
-    if (alpha) {
-      for (int x = 0; x < width_; ++x) {
-        plane(3)[x] = code(static_cast<float>(in[x].alpha) * kUnit<Pixel> * scale.top);
-      }
-    }
+    scaler_.Scale(planes, *frame, model_);
   }
-  scaler_.Scale(yuv, *frame, model_);
   return frame;
 }
 
