@@ -99,20 +99,29 @@ template <int kStages>
 void RowStages(benchmark::State& state) {
   const SelectorParams params = Params(state);
   const std::size_t w = state.range(0), h = state.range(1), inset = params.half_winx + 1;
-  const std::vector<float> image = FloatScene(w, h);
+  const std::vector<std::uint8_t> scene = Scene(w, h);
+  SeparableSmoother unsmoothed({1.0f}, w, h);
+  unsmoothed.Start(scene.data(), w, {0, 0, w, h});
+  unsmoothed.Row(h - 1);
+  const RowFolding& folding = unsmoothed.folding();
   GradientSums sums(params.half_winx, params.half_winy, w);
-  const std::size_t columns = w - 2 * inset;
-  std::vector<float> scores(3 * columns);
-  std::vector<std::uint32_t> maxima;
+  const std::size_t stride = FoldedStride(folding.positions() + 2);
+  const std::size_t count = folding.positions() * RowFolding::kSegments;
+  std::vector<float> scores(3 * stride);
+  std::vector<score_maximum> maxima;
   for (auto _ : state) {
-    sums.Start([&](std::size_t y) { return image.data() + y * w; },
-               {inset, inset, w - inset, h - inset});
+    sums.Start([&](std::size_t y) { return unsmoothed.Row(y); }, w, inset, h - 2 * inset);
     maxima.clear();
     for (std::size_t y = 0; y < h - 2 * inset; ++y) {
-      const auto row = [&](std::size_t r) { return &scores[r % 3 * columns]; };
+      const auto row = [&](std::size_t r) {
+        return &scores[r % 3 * stride + RowFolding::kSegments];
+      };
       const gradient_sum_row sum = sums.NextRow();
-      if (kStages > 1) ScoreRow(sum, columns, params.eig_ratio_threshold, row(y));
-      if (kStages > 2 && y > 1) FindMaxima(row(y - 2), row(y - 1), row(y), columns, 441.0f, maxima);
+      if (kStages > 1) ScoreRow(sum, count, params.eig_ratio_threshold, row(y));
+      if (kStages > 2) FillHalo(row(y), folding.positions(), 1, 0.0f, 0.0f);
+      if (kStages > 2 && y > 1) {
+        FindMaxima(row(y - 2), row(y - 1), row(y), folding, inset, w - inset - 1, 441.0f, maxima);
+      }
       benchmark::ClobberMemory();
     }
   }

@@ -1,8 +1,6 @@
 #include "tracking/corner_score.h"
 
-#include <algorithm>
 #include <bit>
-#include <cmath>
 #include <cstring>
 
 #undef HWY_TARGET_INCLUDE
@@ -15,17 +13,19 @@ namespace marrow::tracking {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
+constexpr std::size_t kSegments = RowFolding::kSegments;
+using Floats = hn::CappedTag<float, kSegments>;
+
 // By rounding, the radicand of a round corner can come out below 0, and a NaN would drop the corner
 // and its neighbours.
 void ScoreRowKernel(const gradient_sum_row& sums, std::size_t count, float eig_ratio_threshold,
                     float* HWY_RESTRICT scores) {
-  const hn::ScalableTag<float> d;
+  const Floats d;
   const std::size_t N = hn::Lanes(d);
   const auto zero = hn::Zero(d);
   const auto four = hn::Set(d, 4.0f);
   const auto ratio = hn::Set(d, eig_ratio_threshold);
-  std::size_t x = 0;
-  for (; x + N <= count; x += N) {
+  for (std::size_t x = 0; x < count; x += N) {
     const auto a = hn::LoadU(d, sums.xx + x);
     const auto b = hn::LoadU(d, sums.yy + x);
     const auto c = hn::LoadU(d, sums.xy + x);
@@ -37,47 +37,47 @@ void ScoreRowKernel(const gradient_sum_row& sums, std::size_t count, float eig_r
     const auto elongated = hn::Gt(hn::Add(t, root), hn::Mul(score, ratio));
     hn::StoreU(hn::IfThenZeroElse(elongated, score), d, scores + x);
   }
-  for (; x < count; ++x) {
-    const float a = sums.xx[x];
-    const float b = sums.yy[x];
-    const float c = sums.xy[x];
-    const float t = a + b;
-    const float root = std::sqrt(std::max(t * t - 4.0f * (a * b - c * c), 0.0f));
-    const float score = t - root;
-    scores[x] = t + root > score * eig_ratio_threshold ? 0.0f : score;
-  }
 }
 
-void FindMaximaKernel(const float* above, const float* row, const float* below, std::size_t count,
-                      float least, std::vector<std::uint32_t>& columns) {
-  const hn::ScalableTag<float> d;
+void FindMaximaKernel(const float* above, const float* row, const float* below,
+                      const RowFolding& folding, std::size_t first, std::size_t last, float least,
+                      std::vector<score_maximum>& maxima) {
+  const Floats d;
   const std::size_t N = hn::Lanes(d);
   const auto floor = hn::Set(d, least);
-  std::size_t x = 1;
-  for (; x + N < count; x += N) {
-    const auto scores = hn::LoadU(d, row + x);
-    const auto too_low = hn::Lt(scores, floor);
-    if (hn::AllTrue(d, too_low)) continue;  // flat surfaces and straight edges
-    const auto side = [&](const float* p) HWY_ATTR {
-      return hn::Max(hn::LoadU(d, p + x - 1), hn::LoadU(d, p + x + 1));
+  const std::size_t count = folding.positions() * kSegments;
+  for (std::size_t lanes_from = 0; lanes_from < kSegments; lanes_from += N) {
+    // Of a position: the larger of the scores above and below, and of all three.
+    const auto outer = [&](std::size_t i) HWY_ATTR {
+      return hn::Max(hn::LoadU(d, above + i), hn::LoadU(d, below + i));
     };
-    const auto vertical = hn::Max(hn::LoadU(d, above + x), hn::LoadU(d, below + x));
-    const auto sides = hn::Max(hn::Max(side(above), side(below)), side(row));
-    const auto is_maximum = hn::AndNot(too_low, hn::Gt(scores, hn::Max(vertical, sides)));
-    if (hn::AllFalse(d, is_maximum)) continue;
-    std::uint8_t bits[8] = {};
-    hn::StoreMaskBits(d, is_maximum, bits);
-    std::uint64_t lanes = 0;
-    std::memcpy(&lanes, bits, sizeof(bits));
-    for (; lanes != 0; lanes &= lanes - 1) {
-      columns.push_back(
-          static_cast<std::uint32_t>(x + static_cast<std::size_t>(std::countr_zero(lanes))));
+    auto scores = hn::LoadU(d, row + lanes_from);
+    auto outer_here = outer(lanes_from);
+    auto left = hn::Max(outer(lanes_from - kSegments), hn::LoadU(d, row + lanes_from - kSegments));
+    auto here = hn::Max(outer_here, scores);
+    for (std::size_t i = lanes_from; i < count; i += kSegments) {
+      const auto next_scores = hn::LoadU(d, row + i + kSegments);
+      const auto outer_right = outer(i + kSegments);
+      const auto right = hn::Max(outer_right, next_scores);
+      const auto neighbours = hn::Max(outer_here, hn::Max(left, right));
+      const auto is_maximum = hn::And(hn::Gt(scores, neighbours), hn::Ge(scores, floor));
+      if (HWY_UNLIKELY(!hn::AllFalse(d, is_maximum))) {
+        std::uint8_t bits[8] = {};
+        hn::StoreMaskBits(d, is_maximum, bits);
+        std::uint64_t lanes = 0;
+        std::memcpy(&lanes, bits, sizeof(bits));
+        for (; lanes != 0; lanes &= lanes - 1) {
+          const std::size_t index = i + static_cast<std::size_t>(std::countr_zero(lanes));
+          const std::size_t column = folding.ColumnAt(index);
+          if (column <= first || column >= last) continue;
+          maxima.push_back({static_cast<std::uint32_t>(column), row[index]});
+        }
+      }
+      scores = next_scores;
+      outer_here = outer_right;
+      left = here;
+      here = right;
     }
-  }
-  for (; x + 1 < count; ++x) {
-    const float best = std::max({above[x - 1], above[x], above[x + 1], row[x - 1], row[x + 1],
-                                 below[x - 1], below[x], below[x + 1]});
-    if (row[x] > best && !(row[x] < least)) columns.push_back(static_cast<std::uint32_t>(x));
   }
 }
 
@@ -96,9 +96,11 @@ void ScoreRow(const gradient_sum_row& sums, std::size_t count, float eig_ratio_t
   HWY_DYNAMIC_DISPATCH(ScoreRowKernel)(sums, count, eig_ratio_threshold, scores);
 }
 
-void FindMaxima(const float* above, const float* row, const float* below, std::size_t count,
-                float least, std::vector<std::uint32_t>& columns) {
-  HWY_DYNAMIC_DISPATCH(FindMaximaKernel)(above, row, below, count, least, columns);
+void FindMaxima(const float* above, const float* row, const float* below, const RowFolding& folding,
+                std::size_t first, std::size_t last, float least,
+                std::vector<score_maximum>& maxima) {
+  HWY_DYNAMIC_DISPATCH(FindMaximaKernel)
+  (above, row, below, folding, first, last, least, maxima);
 }
 
 }  // namespace marrow::tracking

@@ -5,7 +5,6 @@
 #include <utility>
 
 #include "platform/memory/large_pages.h"
-#include "tracking/corner_score.h"
 
 namespace marrow::tracking {
 namespace {
@@ -54,7 +53,7 @@ void FeatureSelector::Configure(std::size_t width, std::size_t height) {
   if (scoring_region_.empty()) return;
 
   gradient_sums_ = std::make_unique<GradientSums>(params_.half_winx, params_.half_winy, width);
-  score_rows_.resize(3 * (scoring_region_.x1 - scoring_region_.x0));
+  score_rows_.resize(3 * FoldedStride(RowFolding{width}.positions() + 2));
   maxima_.reserve(width);
   std::vector<float> kernel = {1.0f};
   if (params_.presmoothing && params_.presmooth_factor > 0.0f) {
@@ -76,27 +75,31 @@ FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
   if (region.empty()) return {};
   // A score's neighbours all lie in the scoring region, whose outermost pixels are never
   // candidates. Three rows of scores are kept, so each is still in the cache when it is compared.
-  const std::size_t columns = region.x1 - region.x0;
   const float area = static_cast<float>((2 * params_.half_winx + 1) * (2 * params_.half_winy + 1));
   const float floor = params_.min_eig * area;  // what is under it is dropped, whatever is best
-  const auto score_row = [&](std::size_t y) { return score_rows_.data() + y % 3 * columns; };
-  float best = -100000.0f;
-  smoother_->Start(luma_.data(), width_, smoothing_region_);
   const PixelRegion& smooth = smoothing_region_;
-  gradient_sums_->Start(
-      [this](std::size_t y) { return smoother_->Row(y); },
-      {region.x0 - smooth.x0, region.y0 - smooth.y0, region.x1 - smooth.x0, region.y1 - smooth.y0});
+  smoother_->Start(luma_.data(), width_, smooth);
+  const RowFolding& folding = smoother_->folding();
+  gradient_sums_->Start([this](std::size_t y) { return smoother_->Row(y); }, folding.columns,
+                        region.y0 - smooth.y0, region.y1 - region.y0);
+  const std::size_t positions = folding.positions();
+  const std::size_t count = positions * RowFolding::kSegments;
+  const auto score_row = [&](std::size_t y) {
+    return score_rows_.data() + y % 3 * (score_rows_.size() / 3) + RowFolding::kSegments;
+  };
+  float best = -100000.0f;
   for (std::size_t y = region.y0; y < region.y1; ++y) {
-    ScoreRow(gradient_sums_->NextRow(), columns, params_.eig_ratio_threshold, score_row(y));
+    ScoreRow(gradient_sums_->NextRow(), count, params_.eig_ratio_threshold, score_row(y));
+    FillHalo(score_row(y), positions, 1, 0.0f, 0.0f);
     if (y < region.y0 + 2) continue;
-    const float* scores = score_row(y - 1);
     maxima_.clear();
-    FindMaxima(score_row(y - 2), scores, score_row(y), columns, floor, maxima_);
-    for (const std::uint32_t x : maxima_) {
-      const std::size_t pixel = (y - 1) * width_ + region.x0 + x;
+    FindMaxima(score_row(y - 2), score_row(y - 1), score_row(y), folding, region.x0 - smooth.x0,
+               region.x1 - smooth.x0 - 1, floor, maxima_);
+    for (const score_maximum& m : maxima_) {
+      const std::size_t pixel = (y - 1) * width_ + smooth.x0 + m.column;
       if (mask_[pixel] == 0) continue;
-      candidates.push_back({static_cast<std::uint32_t>(pixel), scores[x]});
-      best = std::max(best, scores[x]);
+      candidates.push_back({static_cast<std::uint32_t>(pixel), m.score});
+      best = std::max(best, m.score);
     }
   }
   if (best < 0.0f) {

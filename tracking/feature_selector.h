@@ -6,6 +6,7 @@
 #include <memory>
 #include <vector>
 
+#include "tracking/corner_score.h"
 #include "tracking/gaussian_smoothing.h"
 #include "tracking/gradient_sums.h"
 #include "tracking/selector_params.h"
@@ -75,8 +76,8 @@ class FeatureSelector {
   std::uint8_t covered_mark_ = 0;
   std::unique_ptr<SeparableSmoother> smoother_;
   std::unique_ptr<GradientSums> gradient_sums_;
-  std::vector<float> score_rows_;  // the last three rows of scores
-  std::vector<std::uint32_t> maxima_;
+  std::vector<float> score_rows_;  // the last three rows of scores, folded
+  std::vector<score_maximum> maxima_;
 };
 
 }  // namespace marrow::tracking
