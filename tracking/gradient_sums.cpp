@@ -16,13 +16,13 @@ namespace {
 // What the windows of a group of rows are put together from, at every position: planes of sums,
 // each plane of a kind a stride behind the one before.
 struct column_window {
-  std::size_t count;  // of values in a row, a multiple of RowFolding::kSegments
+  std::size_t count;             // of values in a row, a multiple of RowFolding::kSegments
   const float* const* leaving;   // rows from the one above the first window
   const float* const* entering;  // rows from the one above the first that is in no whole group
-  const float* ends;             // of the block's groups from the first one on; null if there is none
-  const float* block_start;      // null where the whole groups end with their block
-  float* next_block_start;       // where ends is not null: with the group that is complete now
-  float* group;                  // the same: that group
+  const float* ends;         // of the block's groups from the first one on; null if there is none
+  const float* block_start;  // null where the whole groups end with their block
+  float* next_block_start;   // where ends is not null: with the group that is complete now
+  float* group;              // the same: that group
   std::size_t group_stride;
   float* sums;  // row after row, three planes each
   std::size_t sum_stride;
@@ -94,8 +94,8 @@ HWY_INLINE void SumColumnWindows(const column_window& w) {
   constexpr std::size_t kEntering = std::max(kGroup, kGroup + kRest - 1);
   for (std::size_t i = 0; i < w.count; i += hn::Lanes(Floats())) {
     Matrix windows[kGroup], group;
-    SumProducts<kGroup, true>(w.leaving, i, [&](std::size_t j, const Matrix& sum)
-                                                HWY_ATTR { windows[j] = sum; });
+    SumProducts<kGroup, true>(w.leaving, i,
+                              [&](std::size_t j, const Matrix& sum) HWY_ATTR { windows[j] = sum; });
     Matrix start;
     if (w.ends) {
       Matrix whole = LoadMatrix(w.ends + i, w.group_stride);

@@ -54,8 +54,8 @@ class GradientSums {
   void SumNextColumns();
 
   std::size_t window_x_, window_y_;
-  std::size_t group_;   // rows in a group: kGroup, or 1 for low windows
-  std::size_t whole_;   // groups that lie wholly inside the windows of a group of rows
+  std::size_t group_;  // rows in a group: kGroup, or 1 for low windows
+  std::size_t whole_;  // groups that lie wholly inside the windows of a group of rows
   std::size_t group_stride_, column_stride_, sum_stride_;  // between planes
   ImageRows image_;
   std::size_t positions_ = 0;
