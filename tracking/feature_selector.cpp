@@ -83,13 +83,12 @@ FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
   gradient_sums_->Start([this](std::size_t y) { return smoother_->Row(y); }, folding.columns,
                         region.y0 - smooth.y0, region.y1 - region.y0);
   const std::size_t positions = folding.positions();
-  const std::size_t count = positions * RowFolding::kSegments;
   const auto score_row = [&](std::size_t y) {
     return score_rows_.data() + y % 3 * (score_rows_.size() / 3) + RowFolding::kSegments;
   };
   float best = -100000.0f;
   for (std::size_t y = region.y0; y < region.y1; ++y) {
-    ScoreRow(gradient_sums_->NextRow(), count, params_.eig_ratio_threshold, score_row(y));
+    gradient_sums_->NextScores(params_.eig_ratio_threshold, score_row(y));
     FillHalo(score_row(y), positions, 1, 0.0f, 0.0f);
     if (y < region.y0 + 2) continue;
     maxima_.clear();

@@ -6,6 +6,7 @@
 #include <memory>
 #include <vector>
 
+#include "platform/memory/line_aligned.h"
 #include "tracking/corner_score.h"
 #include "tracking/gaussian_smoothing.h"
 #include "tracking/gradient_sums.h"
@@ -76,7 +77,7 @@ class FeatureSelector {
   std::uint8_t covered_mark_ = 0;
   std::unique_ptr<SeparableSmoother> smoother_;
   std::unique_ptr<GradientSums> gradient_sums_;
-  std::vector<float> score_rows_;  // the last three rows of scores, folded
+  memory::LineAlignedVector<float> score_rows_;  // the last three rows of scores, folded
   std::vector<score_maximum> maxima_;
 };
 

@@ -10,6 +10,8 @@
 #include <hwy/foreach_target.h>
 #include <hwy/highway.h>
 
+#include "tracking/multiplier_add-inl.h"
+
 HWY_BEFORE_NAMESPACE();
 namespace marrow::tracking {
 namespace HWY_NAMESPACE {
@@ -17,16 +19,6 @@ namespace hn = hwy::HWY_NAMESPACE;
 
 using Floats = hn::CappedTag<float, RowFolding::kSegments>;
 constexpr std::size_t kAtOnce = SeparableSmoother::kAtOnce;
-
-// a + b, on the processor's multipliers where these add too: a fused 1 a + b rounds once, as a sum
-// does. There are two additions to a multiplication here.
-HWY_INLINE hn::Vec<Floats> AddByMultiplier(hn::Vec<Floats> a, hn::Vec<Floats> b) {
-#if HWY_NATIVE_FMA
-  return hn::MulAdd(a, hn::Set(Floats(), 1.0f), b);
-#else
-  return hn::Add(a, b);
-#endif
-}
 
 // taps[0] centre + sum over k of taps[k] (before(k) + after(k)), k ascending. Not fused into
 // multiply-adds: targets without them would round differently. kMany neighbours are made together:
@@ -47,7 +39,7 @@ HWY_INLINE void Smooth(const float* taps, std::size_t radius, Load load, Store s
     before[0] = load(radius - k);
     after[kMany - 1] = load(radius + k + kMany - 1);
     for (std::size_t j = 0; j < kMany; ++j) {
-      const auto pair = j < kMany / 2 ? AddByMultiplier(before[j], after[j]) : hn::Add(before[j], after[j]);
+      const auto pair = j < kMany / 2 ? AddByMultiplier(d, before[j], after[j]) : hn::Add(before[j], after[j]);
       sum[j] = hn::Add(sum[j], hn::Mul(tap, pair));
     }
   }

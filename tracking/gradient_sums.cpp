@@ -8,6 +8,8 @@
 #include <hwy/foreach_target.h>
 #include <hwy/highway.h>
 
+#include "tracking/multiplier_add-inl.h"
+
 #ifndef MARROW_TRACKING_GRADIENT_SUMS_RECORDS_
 #define MARROW_TRACKING_GRADIENT_SUMS_RECORDS_
 namespace marrow::tracking {
@@ -49,6 +51,12 @@ HWY_INLINE Matrix Add(const Matrix& a, const Matrix& b) {
   return {hn::Add(a.xx, b.xx), hn::Add(a.yy, b.yy), hn::Add(a.xy, b.xy)};
 }
 
+HWY_INLINE Matrix AddByMultiplier(const Matrix& a, const Matrix& b) {
+  const Floats d;
+  return {AddByMultiplier(d, a.xx, b.xx), AddByMultiplier(d, a.yy, b.yy),
+          AddByMultiplier(d, a.xy, b.xy)};
+}
+
 HWY_INLINE Matrix LoadMatrix(const float* planes, std::size_t stride) {
   const Floats d;
   return {hn::LoadU(d, planes), hn::LoadU(d, planes + stride), hn::LoadU(d, planes + 2 * stride)};
@@ -70,8 +78,9 @@ HWY_INLINE Matrix Products(Vec above, const float* row, Vec below) {
 
 // Sums of the products of kRows rows, rows[0] above the first of them. kUp: from the lowest row
 // upwards, take(row, sum from it to the lowest); else downwards, take(row, sum from the first).
+// The sums begin with *first, if there is one.
 template <std::size_t kRows, bool kUp, class Take>
-HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, Take take) {
+HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, const Matrix* first, Take take) {
   const Floats d;
   const auto at = [=](std::size_t j) HWY_ATTR { return rows[kUp ? kRows + 1 - j : j] + i; };
   Matrix sum;
@@ -80,7 +89,7 @@ HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, Take take) 
   for (std::size_t j = 0; j < kRows; ++j) {
     const auto ahead = hn::LoadU(d, at(j + 2));
     const Matrix m = kUp ? Products(ahead, at(j + 1), behind) : Products(behind, at(j + 1), ahead);
-    sum = j == 0 ? m : Add(sum, m);
+    sum = j > 0 ? Add(sum, m) : first ? Add(*first, m) : m;
     take(kUp ? kRows - 1 - j : j, sum);
     behind = middle;
     middle = ahead;
@@ -93,23 +102,22 @@ template <std::size_t kGroup, std::size_t kRest>
 HWY_INLINE void SumColumnWindows(const column_window& w) {
   constexpr std::size_t kEntering = std::max(kGroup, kGroup + kRest - 1);
   for (std::size_t i = 0; i < w.count; i += hn::Lanes(Floats())) {
-    Matrix windows[kGroup], group;
-    SumProducts<kGroup, true>(w.leaving, i,
-                              [&](std::size_t j, const Matrix& sum) HWY_ATTR { windows[j] = sum; });
-    Matrix start;
+    Matrix windows[kGroup], group, start, whole;
     if (w.ends) {
-      Matrix whole = LoadMatrix(w.ends + i, w.group_stride);
+      whole = LoadMatrix(w.ends + i, w.group_stride);
       if (w.block_start) {
         start = LoadMatrix(w.block_start + i, w.group_stride);
         whole = Add(whole, start);
       }
-      for (auto& window : windows) window = Add(window, whole);
     }
-    SumProducts<kEntering, false>(w.entering, i, [&](std::size_t j, const Matrix& sum) HWY_ATTR {
+    SumProducts<kGroup, true>(
+        w.leaving, i, w.ends ? &whole : nullptr,
+        [&](std::size_t j, const Matrix& sum) HWY_ATTR { windows[j] = sum; });
+    SumProducts<kEntering, false>(w.entering, i, nullptr, [&](std::size_t j, const Matrix& sum) HWY_ATTR {
       if (j + 1 == kGroup) group = sum;
       const std::size_t window = j + 1 - kRest;
       if (j + 1 >= kRest && window < kGroup && kRest > 0) {
-        windows[window] = Add(windows[window], sum);
+        windows[window] = AddByMultiplier(windows[window], sum);
       }
     });
     for (std::size_t j = 0; j < kGroup; ++j) {
@@ -140,9 +148,9 @@ void SumGroup(const float* const* rows, bool low, std::size_t count, float* grou
     Matrix sum;
     const auto take = [&](std::size_t, const Matrix& so_far) HWY_ATTR { sum = so_far; };
     if (low) {
-      SumProducts<1, false>(rows, i, take);
+      SumProducts<1, false>(rows, i, nullptr, take);
     } else {
-      SumProducts<4, false>(rows, i, take);
+      SumProducts<4, false>(rows, i, nullptr, take);
     }
     StoreMatrix(sum, group + i, stride);
   }
@@ -165,10 +173,11 @@ void SumToEnds(std::size_t groups, std::size_t count, float* planes, std::size_t
 }
 
 // Windows along x. `columns` begins half a window before the first position; `ends` has room for a
-// window.
-void SumRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
-            std::size_t positions, float* HWY_RESTRICT ends, float* HWY_RESTRICT sums,
-            std::size_t sum_stride) {
+// window. take(index in a row, sums).
+template <class Take>
+HWY_INLINE void SumWindows(const float* HWY_RESTRICT columns, std::size_t column_stride,
+                           std::size_t window, std::size_t positions, float* HWY_RESTRICT ends,
+                           Take take) {
   const std::size_t ends_stride = window * kSegments;
   for (std::size_t first = 0; first < positions; first += window) {
     const std::size_t here = std::min(window, positions - first);
@@ -180,18 +189,47 @@ void SumRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::s
         sum = Add(LoadMatrix(block + (p - 1) * kSegments, column_stride), sum);
         StoreMatrix(sum, ends + (p - 1) * kSegments + i, ends_stride);
       }
-      float* out = sums + first * kSegments + i;
-      StoreMatrix(sum, out, sum_stride);
+      take(first * kSegments + i, sum);
       const float* next = block + window * kSegments;
       Matrix start;
       for (std::size_t p = 1; p < here; ++p) {
         const Matrix m = LoadMatrix(next + (p - 1) * kSegments, column_stride);
         start = p == 1 ? m : Add(start, m);
-        StoreMatrix(Add(LoadMatrix(ends + p * kSegments + i, ends_stride), start),
-                    out + p * kSegments, sum_stride);
+        take((first + p) * kSegments + i,
+             AddByMultiplier(LoadMatrix(ends + p * kSegments + i, ends_stride), start));
       }
     }
   }
+}
+
+void SumRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
+            std::size_t positions, float* HWY_RESTRICT ends, float* HWY_RESTRICT sums,
+            std::size_t sum_stride) {
+  SumWindows(columns, column_stride, window, positions, ends,
+             [=](std::size_t i, const Matrix& m)
+                 HWY_ATTR { StoreMatrix(m, sums + i, sum_stride); });
+}
+
+void ScoreRowX(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
+            std::size_t positions, float* HWY_RESTRICT ends, float ratio_limit, float* HWY_RESTRICT scores) {
+  const Floats d;
+  const auto zero = hn::Zero(d);
+  const auto four = hn::Set(d, 4.0f);
+  const auto ratio = hn::Set(d, ratio_limit);
+  SumWindows(columns, column_stride, window, positions, ends,
+             [=](std::size_t i, const Matrix& m)
+                 HWY_ATTR {
+    const auto a = m.xx;
+    const auto b = m.yy;
+    const auto c = m.xy;
+    const auto t = hn::Add(a, b);
+    const auto determinant = hn::Sub(hn::Mul(a, b), hn::Mul(c, c));
+    const auto radicand = hn::Sub(hn::Mul(t, t), hn::Mul(four, determinant));
+    const auto root = hn::Sqrt(hn::Max(radicand, zero));
+    const auto score = hn::Sub(t, root);
+    const auto elongated = hn::Gt(hn::Add(t, root), hn::Mul(score, ratio));
+    hn::StoreU(hn::IfThenZeroElse(elongated, score), d, scores + i);
+                 });
 }
 
 }  // namespace HWY_NAMESPACE
@@ -206,6 +244,7 @@ HWY_EXPORT(SumColumns);
 HWY_EXPORT(SumGroup);
 HWY_EXPORT(SumToEnds);
 HWY_EXPORT(SumRow);
+HWY_EXPORT(ScoreRowX);
 
 }  // namespace
 
@@ -241,6 +280,15 @@ gradient_sum_row GradientSums::NextRow() {
   (column_sums_.data() + in_group * 3 * column_stride_, column_stride_, window_x_, positions_,
    ends_.data(), sums_.data(), sum_stride_);
   return {sums_.data(), sums_.data() + sum_stride_, sums_.data() + 2 * sum_stride_};
+}
+
+void GradientSums::NextScores(float ratio, float* scores) {
+  const std::size_t in_group = next_ % group_;
+  if (in_group == 0) SumNextColumns();
+  ++next_;
+  HWY_DYNAMIC_DISPATCH(ScoreRowX)
+  (column_sums_.data() + in_group * 3 * column_stride_, column_stride_, window_x_, positions_,
+   ends_.data(), ratio, scores);
 }
 
 // Past the last row that windows depend on, it repeats: for rows of a group that nobody asks for.

@@ -4,6 +4,7 @@
 #include <functional>
 #include <vector>
 
+#include "platform/memory/line_aligned.h"
 #include "tracking/folded_rows.h"
 
 namespace marrow::tracking {
@@ -43,6 +44,7 @@ class GradientSums {
   // Sums of the next row, valid until the next call. Of the columns whose windows, with one pixel
   // about them, do not lie inside the image, and behind the last one, the sums mean nothing.
   gradient_sum_row NextRow();
+  void NextScores(float ratio, float* scores);
 
  private:
   // Rows of windows that are made together, and rows in a group.
@@ -64,11 +66,11 @@ class GradientSums {
   std::size_t next_ = 0;        // row of the sums
   // By group of a block, three planes each: the sum from it to the end of its block, or, of those
   // that the windows have left, of the group one block on.
-  std::vector<float> groups_;
-  std::vector<float> block_start_;  // sum of the groups of the next block so far
-  std::vector<float> column_sums_;  // by row of a group, over the rows of a window
-  std::vector<float> ends_;         // along x: sums from a position to the end of its block
-  std::vector<float> sums_;
+  memory::LineAlignedVector<float> groups_;
+  memory::LineAlignedVector<float> block_start_;  // sum of the groups of the next block so far
+  memory::LineAlignedVector<float> column_sums_;  // by row of a group, over the rows of a window
+  memory::LineAlignedVector<float> ends_;         // along x: sums from a position to the end of its block
+  memory::LineAlignedVector<float> sums_;
 };
 
 }  // namespace marrow::tracking
