@@ -8,7 +8,7 @@
 #include <random>
 #include <vector>
 
-#include "tracking/corner_score.h"
+#include "tracking/score_maxima.h"
 
 // Milliseconds a frame of the selector, whole and by stages, beside plain passes over whole images
 // and OpenCV's goodFeaturesToTrack on one thread with the same window, spacing and count.
@@ -94,7 +94,7 @@ void PresmoothingOpenCv(benchmark::State& state) {
   }
 }
 
-// Stages 1 to 3: gradient sums; with scores; with maxima. Each includes the ones before.
+// Stages 1 to 3: gradient sums; scores in their place; with maxima.
 template <int kStages>
 void RowStages(benchmark::State& state) {
   const SelectorParams params = Params(state);
@@ -106,8 +106,7 @@ void RowStages(benchmark::State& state) {
   const RowFolding& folding = unsmoothed.folding();
   GradientSums sums(params.half_winx, params.half_winy, w);
   const std::size_t stride = FoldedStride(folding.positions() + 2);
-  const std::size_t count = folding.positions() * RowFolding::kSegments;
-  std::vector<float> scores(3 * stride);
+  memory::LineAlignedVector<float> scores(3 * stride);
   std::vector<score_maximum> maxima;
   for (auto _ : state) {
     sums.Start([&](std::size_t y) { return unsmoothed.Row(y); }, w, inset, h - 2 * inset);
@@ -116,8 +115,8 @@ void RowStages(benchmark::State& state) {
       const auto row = [&](std::size_t r) {
         return &scores[r % 3 * stride + RowFolding::kSegments];
       };
-      const gradient_sum_row sum = sums.NextRow();
-      if (kStages > 1) ScoreRow(sum, count, params.eig_ratio_threshold, row(y));
+      if (kStages == 1) sums.NextRow();
+      if (kStages > 1) sums.NextScores(params.eig_ratio_threshold, row(y));
       if (kStages > 2) FillHalo(row(y), folding.positions(), 1, 0.0f, 0.0f);
       if (kStages > 2 && y > 1) {
         FindMaxima(row(y - 2), row(y - 1), row(y), folding, inset, w - inset - 1, 441.0f, maxima);

@@ -7,9 +7,9 @@
 #include <vector>
 
 #include "platform/memory/line_aligned.h"
-#include "tracking/corner_score.h"
 #include "tracking/gaussian_smoothing.h"
 #include "tracking/gradient_sums.h"
+#include "tracking/score_maxima.h"
 #include "tracking/selector_params.h"
 #include "tracking/track_store.h"
 

@@ -39,7 +39,8 @@ HWY_INLINE void Smooth(const float* taps, std::size_t radius, Load load, Store s
     before[0] = load(radius - k);
     after[kMany - 1] = load(radius + k + kMany - 1);
     for (std::size_t j = 0; j < kMany; ++j) {
-      const auto pair = j < kMany / 2 ? AddByMultiplier(d, before[j], after[j]) : hn::Add(before[j], after[j]);
+      const auto pair =
+          j < kMany / 2 ? AddByMultiplier(d, before[j], after[j]) : hn::Add(before[j], after[j]);
       sum[j] = hn::Add(sum[j], hn::Mul(tap, pair));
     }
   }

@@ -49,15 +49,16 @@ class SeparableSmoother {
   void PutIntoRing(std::size_t y);
   void MakeRows();
 
-  std::vector<float> taps_;           // middle tap first
-  std::vector<std::uint8_t> padded_;  // one row with its last pixel repeated
-  memory::LineAlignedVector<float> folded_;         // the same, with a halo of the taps' radius
+  std::vector<float> taps_;                  // middle tap first
+  std::vector<std::uint8_t> padded_;         // one row with its last pixel repeated
+  memory::LineAlignedVector<float> folded_;  // the same, with a halo of the taps' radius
   std::size_t ring_stride_;
-  memory::LineAlignedVector<float> ring_;         // the rows that are at hand, smoothed along x
+  memory::LineAlignedVector<float> ring_;  // the rows that are at hand, smoothed along x
   std::vector<const float*> rows_;  // in the ring: those that a few neighbouring rows depend on
   std::size_t smooth_stride_;
-  std::size_t smooth_rows_;    // in smooth_, a multiple of kAtOnce
-  memory::LineAlignedVector<float> smooth_;  // the last rows, smoothed both ways, one after the other
+  std::size_t smooth_rows_;  // in smooth_, a multiple of kAtOnce
+  memory::LineAlignedVector<float>
+      smooth_;  // the last rows, smoothed both ways, one after the other
   const std::uint8_t* image_ = nullptr;
   std::size_t stride_ = 0;
   PixelRegion region_{};

@@ -1,6 +1,7 @@
 #include "tracking/gradient_sums.h"
 
 #include <algorithm>
+#include <type_traits>
 #include <utility>
 
 #undef HWY_TARGET_INCLUDE
@@ -8,6 +9,7 @@
 #include <hwy/foreach_target.h>
 #include <hwy/highway.h>
 
+#include "tracking/corner_score-inl.h"
 #include "tracking/multiplier_add-inl.h"
 
 #ifndef MARROW_TRACKING_GRADIENT_SUMS_RECORDS_
@@ -80,7 +82,8 @@ HWY_INLINE Matrix Products(Vec above, const float* row, Vec below) {
 // upwards, take(row, sum from it to the lowest); else downwards, take(row, sum from the first).
 // The sums begin with *first, if there is one.
 template <std::size_t kRows, bool kUp, class Take>
-HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, const Matrix* first, Take take) {
+HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, const Matrix* first,
+                            Take take) {
   const Floats d;
   const auto at = [=](std::size_t j) HWY_ATTR { return rows[kUp ? kRows + 1 - j : j] + i; };
   Matrix sum;
@@ -110,16 +113,16 @@ HWY_INLINE void SumColumnWindows(const column_window& w) {
         whole = Add(whole, start);
       }
     }
-    SumProducts<kGroup, true>(
-        w.leaving, i, w.ends ? &whole : nullptr,
-        [&](std::size_t j, const Matrix& sum) HWY_ATTR { windows[j] = sum; });
-    SumProducts<kEntering, false>(w.entering, i, nullptr, [&](std::size_t j, const Matrix& sum) HWY_ATTR {
-      if (j + 1 == kGroup) group = sum;
-      const std::size_t window = j + 1 - kRest;
-      if (j + 1 >= kRest && window < kGroup && kRest > 0) {
-        windows[window] = AddByMultiplier(windows[window], sum);
-      }
-    });
+    SumProducts<kGroup, true>(w.leaving, i, w.ends ? &whole : nullptr,
+                              [&](std::size_t j, const Matrix& sum) HWY_ATTR { windows[j] = sum; });
+    SumProducts<kEntering, false>(w.entering, i, nullptr,
+                                  [&](std::size_t j, const Matrix& sum) HWY_ATTR {
+                                    if (j + 1 == kGroup) group = sum;
+                                    const std::size_t window = j + 1 - kRest;
+                                    if (j + 1 >= kRest && window < kGroup && kRest > 0) {
+                                      windows[window] = AddByMultiplier(windows[window], sum);
+                                    }
+                                  });
     for (std::size_t j = 0; j < kGroup; ++j) {
       StoreMatrix(windows[j], w.sums + 3 * j * w.sum_stride + i, w.sum_stride);
     }
@@ -131,29 +134,35 @@ HWY_INLINE void SumColumnWindows(const column_window& w) {
   }
 }
 
-// low: windows of fewer rows than two groups and a rest.
-void SumColumns(const column_window& w, std::size_t rest, bool low) {
-  if (low) {
-    SumColumnWindows<1, 0>(w);
+// Calls sum with std::integral_constant of group and rest.
+template <class Call>
+HWY_INLINE void WithGroup(std::size_t group, std::size_t rest, Call call) {
+  using std::integral_constant;
+  if (group == 6) {
+    call(integral_constant<std::size_t, 6>(), integral_constant<std::size_t, 1>());
+  } else if (group == 1) {
+    call(integral_constant<std::size_t, 1>(), integral_constant<std::size_t, 0>());
   } else if (rest == 1) {
-    SumColumnWindows<4, 1>(w);
+    call(integral_constant<std::size_t, 4>(), integral_constant<std::size_t, 1>());
   } else {
-    SumColumnWindows<4, 3>(w);
+    call(integral_constant<std::size_t, 4>(), integral_constant<std::size_t, 3>());
   }
 }
 
-void SumGroup(const float* const* rows, bool low, std::size_t count, float* group,
+void SumColumns(const column_window& w, std::size_t group, std::size_t rest) {
+  WithGroup(group, rest, [&w](auto g, auto r) HWY_ATTR { SumColumnWindows<g(), r()>(w); });
+}
+
+void SumGroup(const float* const* rows, std::size_t group_rows, std::size_t count, float* group,
               std::size_t stride) {
-  for (std::size_t i = 0; i < count; i += hn::Lanes(Floats())) {
-    Matrix sum;
-    const auto take = [&](std::size_t, const Matrix& so_far) HWY_ATTR { sum = so_far; };
-    if (low) {
-      SumProducts<1, false>(rows, i, nullptr, take);
-    } else {
-      SumProducts<4, false>(rows, i, nullptr, take);
+  WithGroup(group_rows, 1, [=](auto g, auto) HWY_ATTR {
+    for (std::size_t i = 0; i < count; i += hn::Lanes(Floats())) {
+      Matrix sum;
+      SumProducts<g(), false>(rows, i, nullptr,
+                              [&](std::size_t, const Matrix& so_far) HWY_ATTR { sum = so_far; });
+      StoreMatrix(sum, group + i, stride);
     }
-    StoreMatrix(sum, group + i, stride);
-  }
+  });
 }
 
 // Turns the sums of a block's groups into sums from each group to the end of the block.
@@ -210,26 +219,14 @@ void SumRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::s
                  HWY_ATTR { StoreMatrix(m, sums + i, sum_stride); });
 }
 
-void ScoreRowX(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
-            std::size_t positions, float* HWY_RESTRICT ends, float ratio_limit, float* HWY_RESTRICT scores) {
+void ScoreRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
+              std::size_t positions, float* HWY_RESTRICT ends, float most_ratio,
+              float* HWY_RESTRICT scores) {
   const Floats d;
-  const auto zero = hn::Zero(d);
-  const auto four = hn::Set(d, 4.0f);
-  const auto ratio = hn::Set(d, ratio_limit);
+  const auto ratio = hn::Set(d, most_ratio);
   SumWindows(columns, column_stride, window, positions, ends,
              [=](std::size_t i, const Matrix& m)
-                 HWY_ATTR {
-    const auto a = m.xx;
-    const auto b = m.yy;
-    const auto c = m.xy;
-    const auto t = hn::Add(a, b);
-    const auto determinant = hn::Sub(hn::Mul(a, b), hn::Mul(c, c));
-    const auto radicand = hn::Sub(hn::Mul(t, t), hn::Mul(four, determinant));
-    const auto root = hn::Sqrt(hn::Max(radicand, zero));
-    const auto score = hn::Sub(t, root);
-    const auto elongated = hn::Gt(hn::Add(t, root), hn::Mul(score, ratio));
-    hn::StoreU(hn::IfThenZeroElse(elongated, score), d, scores + i);
-                 });
+                 HWY_ATTR { hn::StoreU(CornerScore(d, m.xx, m.yy, m.xy, ratio), d, scores + i); });
 }
 
 }  // namespace HWY_NAMESPACE
@@ -244,14 +241,24 @@ HWY_EXPORT(SumColumns);
 HWY_EXPORT(SumGroup);
 HWY_EXPORT(SumToEnds);
 HWY_EXPORT(SumRow);
-HWY_EXPORT(ScoreRowX);
+HWY_EXPORT(ScoreRow);
+
+constexpr std::size_t kMostGroup = 6;
+
+// Rows in a group. Of a window of whole groups and one row, as many rows enter as leave; with three
+// rows over, two of those that enter are formed a second time for the next group.
+std::size_t GroupFor(std::size_t window) {
+  if (window < 5) return 1;
+  return window % 6 == 1 ? 6 : 4;
+}
 
 }  // namespace
 
 GradientSums::GradientSums(std::size_t half_win_x, std::size_t half_win_y, std::size_t max_width)
     : window_x_(2 * half_win_x + 1),
       window_y_(2 * half_win_y + 1),
-      group_(window_y_ < kGroup + 1 ? 1 : kGroup),
+      group_(GroupFor(window_y_)),
+      rest_(group_ == 1 ? 0 : window_y_ % group_),
       whole_(window_y_ / group_ - 1) {
   const std::size_t positions = RowFolding{max_width}.positions();
   group_stride_ = sum_stride_ = FoldedStride(positions);
@@ -272,23 +279,22 @@ void GradientSums::Start(ImageRows image, std::size_t columns, std::size_t first
   next_ = 0;
 }
 
+const float* GradientSums::NextColumnSums() {
+  if (next_ % group_ == 0) SumNextColumns();
+  return column_sums_.data() + next_++ % group_ * 3 * column_stride_;
+}
+
 gradient_sum_row GradientSums::NextRow() {
-  const std::size_t in_group = next_ % group_;
-  if (in_group == 0) SumNextColumns();
-  ++next_;
   HWY_DYNAMIC_DISPATCH(SumRow)
-  (column_sums_.data() + in_group * 3 * column_stride_, column_stride_, window_x_, positions_,
-   ends_.data(), sums_.data(), sum_stride_);
+  (NextColumnSums(), column_stride_, window_x_, positions_, ends_.data(), sums_.data(),
+   sum_stride_);
   return {sums_.data(), sums_.data() + sum_stride_, sums_.data() + 2 * sum_stride_};
 }
 
-void GradientSums::NextScores(float ratio, float* scores) {
-  const std::size_t in_group = next_ % group_;
-  if (in_group == 0) SumNextColumns();
-  ++next_;
-  HWY_DYNAMIC_DISPATCH(ScoreRowX)
-  (column_sums_.data() + in_group * 3 * column_stride_, column_stride_, window_x_, positions_,
-   ends_.data(), ratio, scores);
+void GradientSums::NextScores(float eig_ratio_threshold, float* scores) {
+  HWY_DYNAMIC_DISPATCH(ScoreRow)
+  (NextColumnSums(), column_stride_, window_x_, positions_, ends_.data(), eig_ratio_threshold,
+   scores);
 }
 
 // Past the last row that windows depend on, it repeats: for rows of a group that nobody asks for.
@@ -299,14 +305,12 @@ void GradientSums::FindRows(std::size_t first, std::size_t count, const float** 
 void GradientSums::SumNextColumns() {
   const std::size_t group_index = next_ / group_;
   const std::size_t count = positions_ * RowFolding::kSegments;
-  const bool low = group_ == 1;
-  const std::size_t rest = window_y_ % kGroup;
   if (group_index == 0) SumFirstGroups();
 
   // The lowest row first: what it pushes out is not read again.
-  const float* rows[2 * kGroup + 6];
+  const float* rows[2 * kMostGroup + 6];
   const std::size_t leaving = group_ + 2;
-  const std::size_t entering = low ? 3 : kGroup + rest + 1;
+  const std::size_t entering = std::max(group_, group_ + rest_ - 1) + 2;
   FindRows(window_top_ + (whole_ + 1) * group_ - 1, entering, rows + leaving);
   FindRows(window_top_ - 1, leaving, rows);
 
@@ -323,7 +327,7 @@ void GradientSums::SumNextColumns() {
   w.group_stride = group_stride_;
   w.sums = column_sums_.data() + (window_x_ / 2) * RowFolding::kSegments;
   w.sum_stride = column_stride_;
-  HWY_DYNAMIC_DISPATCH(SumColumns)(w, rest, low);
+  HWY_DYNAMIC_DISPATCH(SumColumns)(w, group_, rest_);
   if (whole_ > 0 && group_index % whole_ == whole_ - 1) {
     HWY_DYNAMIC_DISPATCH(SumToEnds)(whole_, count, groups_.data(), group_stride_);
   }
@@ -337,10 +341,10 @@ void GradientSums::SumNextColumns() {
 void GradientSums::SumFirstGroups() {
   if (whole_ == 0) return;
   const std::size_t count = positions_ * RowFolding::kSegments;
-  const float* rows[kGroup + 2];
+  const float* rows[kMostGroup + 2];
   for (std::size_t g = 0; g < whole_; ++g) {
     FindRows(window_top_ + (g + 1) * group_ - 1, group_ + 2, rows);
-    HWY_DYNAMIC_DISPATCH(SumGroup)(rows, group_ == 1, count, GroupSums(g), group_stride_);
+    HWY_DYNAMIC_DISPATCH(SumGroup)(rows, group_, count, GroupSums(g), group_stride_);
   }
   HWY_DYNAMIC_DISPATCH(SumToEnds)(whole_, count, groups_.data(), group_stride_);
 }

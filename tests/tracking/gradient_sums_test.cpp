@@ -1,53 +1,18 @@
 #include "tracking/gradient_sums.h"
 
-#include <gmock/gmock.h>
+#include <gtest/gtest.h>
 
 #include <algorithm>
 #include <cmath>
-#include <limits>
 #include <random>
 #include <utility>
 #include <vector>
 
 #include "tests/support/each_instruction_set.h"
-#include "tracking/corner_score.h"
+#include "tests/tracking/folded_image.h"
 
 namespace marrow::tracking {
 namespace {
-
-constexpr float kNaN = std::numeric_limits<float>::quiet_NaN();
-
-// Rows folded with a halo of one position, NaN where the image has no pixels.
-class FoldedImage {
- public:
-  FoldedImage(std::size_t width, std::size_t height)
-      : folding_{width},
-        stride_((folding_.positions() + 2) * RowFolding::kSegments),
-        values_(stride_ * height, kNaN) {}
-
-  // From an image of rows one after the other.
-  explicit FoldedImage(const std::vector<float>& image, std::size_t width)
-      : FoldedImage(width, image.size() / width) {
-    const int positions = folding_.positions();
-    for (std::size_t y = 0; y < image.size() / width; ++y) {
-      for (int p = -1; p <= positions; ++p) {
-        for (int segment = 0; segment < int(RowFolding::kSegments); ++segment) {
-          const int x = segment * positions + p;
-          if (x < 0 || x >= int(width)) continue;
-          Row(y)[p * int(RowFolding::kSegments) + segment] = image[y * width + x];
-        }
-      }
-    }
-  }
-
-  const RowFolding& folding() const { return folding_; }
-  float* Row(std::size_t y) { return values_.data() + y * stride_ + RowFolding::kSegments; }
-
- private:
-  RowFolding folding_;
-  std::size_t stride_;
-  std::vector<float> values_;
-};
 
 struct PlainSums {
   double xx = 0, yy = 0, xy = 0;
@@ -163,52 +128,44 @@ TEST(GradientSumsTest, StrongTextureLeavesNoTraceAboutIt) {
   });
 }
 
-TEST(ScoreRowTest, EigenvaluesElongationAndRoundCorners) {
-  // diag(100, 50); diag(100, 5); a straight edge; nothing; a round corner whose radicand rounds
-  // below 0.
-  std::vector<float> xx, yy, xy;
-  for (int repeat = 0; repeat < 16; ++repeat) {
-    for (const float v : {100.f, 100.f, 50.f, 0.f, 3.0000002f}) xx.push_back(v);
-    for (const float v : {50.f, 5.f, 50.f, 0.f, 3.0f}) yy.push_back(v);
-    for (const float v : {0.f, 0.f, 50.f, 0.f, 1e-4f}) xy.push_back(v);
-  }
-  const gradient_sum_row sums{xx.data(), yy.data(), xy.data()};
-  std::vector<float> scores(80);
-  ScoreRow(sums, 80, 15.0f, scores.data());
-  for (int i = 0; i < 80; i += 5) {
-    EXPECT_EQ(scores[i], 100.0f);    // twice the smaller eigenvalue
-    EXPECT_EQ(scores[i + 1], 0.0f);  // ratio 20
-    EXPECT_EQ(scores[i + 2], 0.0f);
-    EXPECT_EQ(scores[i + 3], 0.0f);
-    EXPECT_NEAR(scores[i + 4], 6.0f, 2e-3f);
-  }
-  ScoreRow(sums, 80, 20.1f, scores.data());
-  EXPECT_EQ(scores[1], 10.0f);
+float PlainScore(float a, float b, float c, float ratio, int* below_zero) {
+  const float t = a + b;
+  const float radicand = t * t - 4.0f * (a * b - c * c);
+  if (radicand < 0.0f) ++*below_zero;
+  const float d = std::sqrt(std::max(radicand, 0.0f));
+  return t + d > (t - d) * ratio ? 0.0f : t - d;
 }
 
-TEST(FindMaximaTest, StrictOverAllEightNeighboursAndNotUnderTheLeast) {
-  std::mt19937 random(9);
-  for (const std::size_t count : {3, 4, 15, 16, 17, 18, 31, 32, 33, 60, 200}) {
-    std::vector<float> image(3 * count);
-    for (float& v : image) v = random() % 12;  // with many ties
-    const float least = count % 3 * 4;
-    const std::size_t first = count % 2, last = count - 1 - first;
-    std::vector<std::pair<std::size_t, float>> expected;
-    for (std::size_t x = first + 1; x < last; ++x) {
-      int under = 0;
-      for (int y = 0; y < 3; ++y) {
-        for (int dx = -1; dx <= 1; ++dx) under += image[y * count + x + dx] < image[count + x];
-      }
-      if (under == 8 && image[count + x] >= least) expected.push_back({x, image[count + x]});
+// Corners, straight edges, flat surfaces, and round blobs, at some of which the radicand rounds
+// below 0.
+TEST(GradientSumsTest, ScoresAreThoseOfTheSums) {
+  constexpr int kWidth = 250, kHeight = 60, kHalf = 3;
+  std::vector<float> image(kWidth * kHeight, 30.0f);
+  for (int y = 0; y < kHeight; ++y) {
+    for (int x = 0; x < kWidth; ++x) {
+      float& v = image[y * kWidth + x];
+      if (x < 30) v = (x > 8) * 100 + (x > 18 && y > 20) * 60;
+      const int blob = x / 20, dx = x % 20 - 10, dy = y - 30;
+      if (x >= 40) v += 200.0f * std::exp(-0.01f * blob * (dx * dx + dy * dy));
     }
-    tests::OnEachInstructionSet([&] {
-      FoldedImage rows(image, count);
-      std::vector<score_maximum> maxima;
-      FindMaxima(rows.Row(0), rows.Row(1), rows.Row(2), rows.folding(), first, last, least, maxima);
-      std::vector<std::pair<std::size_t, float>> found;
-      for (const auto& m : maxima) found.push_back({m.column, m.score});
-      EXPECT_THAT(found, testing::UnorderedElementsAreArray(expected)) << count;
+  }
+  for (const float ratio : {15.0f, 3.0f}) {
+    FoldedImage folded(image, kWidth);
+    GradientSums scorer(kHalf, kHalf, kWidth);
+    scorer.Start([&](std::size_t y) { return folded.Row(y); }, kWidth, kHalf + 1,
+                 kHeight - 2 * (kHalf + 1));
+    std::vector<float> scores(folded.folding().positions() * RowFolding::kSegments);
+    int row = 0, below_zero = 0, elongated = 0, corners = 0;
+    ForEachSum(image, kWidth, kHalf, kHalf, [&](int x, int y, float a, float b, float c) {
+      if (y != row) scorer.NextScores(ratio, scores.data());
+      row = y;
+      const float expected = PlainScore(a, b, c, ratio, &below_zero);
+      ASSERT_EQ(scores[folded.folding().IndexOf(x)], expected) << x << ',' << y;
+      (expected == 0.0f ? elongated : corners) += a + b > 0.0f;
     });
+    EXPECT_GT(below_zero, 0);
+    EXPECT_GT(elongated, 0);
+    EXPECT_GT(corners, 0);
   }
 }
 

@@ -4,16 +4,9 @@
 #include <cstdint>
 #include <vector>
 
-#include "tracking/gradient_sums.h"
+#include "tracking/folded_rows.h"
 
 namespace marrow::tracking {
-
-// Twice the smaller eigenvalue of each gradient matrix (Shi and Tomasi, 1994): with a, b, c the
-// sums of Ix Ix, Iy Iy, Ix Iy, t = a + b and d = sqrt(t t - 4 (a b - c c)), the score is t - d. It
-// is 0 where the structure is too elongated, that is where t + d > score * eig_ratio_threshold.
-// `count`, of values, is a multiple of RowFolding::kSegments.
-void ScoreRow(const gradient_sum_row& sums, std::size_t count, float eig_ratio_threshold,
-              float* scores);
 
 struct score_maximum {
   std::uint32_t column;

@@ -1,10 +1,10 @@
-#include "tracking/corner_score.h"
+#include "tracking/score_maxima.h"
 
 #include <bit>
 #include <cstring>
 
 #undef HWY_TARGET_INCLUDE
-#define HWY_TARGET_INCLUDE "tracking/corner_score.cpp"
+#define HWY_TARGET_INCLUDE "tracking/score_maxima.cpp"
 #include <hwy/foreach_target.h>
 #include <hwy/highway.h>
 
@@ -15,29 +15,6 @@ namespace hn = hwy::HWY_NAMESPACE;
 
 constexpr std::size_t kSegments = RowFolding::kSegments;
 using Floats = hn::CappedTag<float, kSegments>;
-
-// By rounding, the radicand of a round corner can come out below 0, and a NaN would drop the corner
-// and its neighbours.
-void ScoreRowKernel(const gradient_sum_row& sums, std::size_t count, float eig_ratio_threshold,
-                    float* HWY_RESTRICT scores) {
-  const Floats d;
-  const std::size_t N = hn::Lanes(d);
-  const auto zero = hn::Zero(d);
-  const auto four = hn::Set(d, 4.0f);
-  const auto ratio = hn::Set(d, eig_ratio_threshold);
-  for (std::size_t x = 0; x < count; x += N) {
-    const auto a = hn::LoadU(d, sums.xx + x);
-    const auto b = hn::LoadU(d, sums.yy + x);
-    const auto c = hn::LoadU(d, sums.xy + x);
-    const auto t = hn::Add(a, b);
-    const auto determinant = hn::Sub(hn::Mul(a, b), hn::Mul(c, c));
-    const auto radicand = hn::Sub(hn::Mul(t, t), hn::Mul(four, determinant));
-    const auto root = hn::Sqrt(hn::Max(radicand, zero));
-    const auto score = hn::Sub(t, root);
-    const auto elongated = hn::Gt(hn::Add(t, root), hn::Mul(score, ratio));
-    hn::StoreU(hn::IfThenZeroElse(elongated, score), d, scores + x);
-  }
-}
 
 void FindMaximaKernel(const float* above, const float* row, const float* below,
                       const RowFolding& folding, std::size_t first, std::size_t last, float least,
@@ -88,13 +65,7 @@ HWY_AFTER_NAMESPACE();
 #if HWY_ONCE
 namespace marrow::tracking {
 
-HWY_EXPORT(ScoreRowKernel);
 HWY_EXPORT(FindMaximaKernel);
-
-void ScoreRow(const gradient_sum_row& sums, std::size_t count, float eig_ratio_threshold,
-              float* scores) {
-  HWY_DYNAMIC_DISPATCH(ScoreRowKernel)(sums, count, eig_ratio_threshold, scores);
-}
 
 void FindMaxima(const float* above, const float* row, const float* below, const RowFolding& folding,
                 std::size_t first, std::size_t last, float least,
