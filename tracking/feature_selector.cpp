@@ -1,5 +1,7 @@
 #include "tracking/feature_selector.h"
 
+#include <hwy/cache_control.h>
+
 #include <algorithm>
 #include <cmath>
 #include <utility>
@@ -77,6 +79,7 @@ FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
   // candidates. Three rows of scores are kept, so each is still in the cache when it is compared.
   const float area = static_cast<float>((2 * params_.half_winx + 1) * (2 * params_.half_winy + 1));
   const float floor = params_.min_eig * area;  // what is under it is dropped, whatever is best
+  const float highest_cap = params_.max_eig * area;
   const PixelRegion& smooth = smoothing_region_;
   smoother_->Start(luma_.data(), width_, smooth);
   const RowFolding& folding = smoother_->folding();
@@ -87,26 +90,39 @@ FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
     return score_rows_.data() + y % 3 * (score_rows_.size() / 3) + RowFolding::kSegments;
   };
   float best = -100000.0f;
+  std::size_t checked = 0;
+  // Masks are looked at a row late: until then the cache has them.
+  const auto check_masks = [&] {
+    const auto masked = [this](const Candidate& c) { return mask_[c.pixel] == 0; };
+    candidates.erase(std::remove_if(candidates.begin() + static_cast<std::ptrdiff_t>(checked),
+                                    candidates.end(), masked),
+                     candidates.end());
+    for (; checked < candidates.size(); ++checked) best = std::max(best, candidates[checked].score);
+  };
   for (std::size_t y = region.y0; y < region.y1; ++y) {
     gradient_sums_->NextScores(params_.eig_ratio_threshold, score_row(y));
     FillHalo(score_row(y), positions, 1, 0.0f, 0.0f);
     if (y < region.y0 + 2) continue;
+    check_masks();
+    // The best can only rise, and with it the limit.
+    const float least =
+        best < 0.0f ? floor : std::max(floor, params_.threshold * std::min(best, highest_cap));
     maxima_.clear();
     FindMaxima(score_row(y - 2), score_row(y - 1), score_row(y), folding, region.x0 - smooth.x0,
-               region.x1 - smooth.x0 - 1, floor, maxima_);
+               region.x1 - smooth.x0 - 1, least, maxima_);
     for (const score_maximum& m : maxima_) {
       const std::size_t pixel = (y - 1) * width_ + smooth.x0 + m.column;
-      if (mask_[pixel] == 0) continue;
+      hwy::Prefetch(&mask_[pixel]);
       candidates.push_back({static_cast<std::uint32_t>(pixel), m.score});
-      best = std::max(best, m.score);
     }
   }
+  check_masks();
   if (best < 0.0f) {
     candidates.clear();
     return {};
   }
 
-  const float cap = std::min(best, params_.max_eig * area);
+  const float cap = std::min(best, highest_cap);
   const float limit = std::max(params_.threshold * cap, floor);
   std::erase_if(candidates, [limit](const Candidate& c) { return c.score < limit; });
   if (candidates.empty()) return {};

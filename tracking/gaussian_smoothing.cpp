@@ -1,5 +1,7 @@
 #include "tracking/gaussian_smoothing.h"
 
+#include <hwy/cache_control.h>
+
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
@@ -163,6 +165,9 @@ void SeparableSmoother::PutIntoRing(std::size_t y) {
   const std::size_t radius = taps_.size() - 1;
   const std::size_t positions = folding_.positions();
   const std::uint8_t* row = image_ + (region_.y0 + y) * stride_ + region_.x0;
+  if (region_.y0 + y + 1 < region_.y1) {
+    for (std::size_t x = 0; x < folding_.columns; x += 64) hwy::Prefetch(row + stride_ + x);
+  }
   const std::uint8_t last = row[folding_.columns - 1];
   std::fill(std::copy_n(row, folding_.columns, padded_.begin()), padded_.end(), last);
   float* folded = folded_.data() + radius * RowFolding::kSegments;

@@ -37,7 +37,7 @@ void FindMaximaKernel(const float* above, const float* row, const float* below,
       const auto outer_right = outer(i + kSegments);
       const auto right = hn::Max(outer_right, next_scores);
       const auto neighbours = hn::Max(outer_here, hn::Max(left, right));
-      const auto is_maximum = hn::And(hn::Gt(scores, neighbours), hn::Ge(scores, floor));
+      const auto is_maximum = hn::AndNot(hn::Lt(scores, floor), hn::Gt(scores, neighbours));
       if (HWY_UNLIKELY(!hn::AllFalse(d, is_maximum))) {
         std::uint8_t bits[8] = {};
         hn::StoreMaskBits(d, is_maximum, bits);
