@@ -40,9 +40,15 @@ void FeatureSelector::Configure(std::size_t width, std::size_t height) {
   height_ = height;
   // A longer distance covers the whole image from any pixel just as well.
   spacing_ = std::min<std::uint64_t>(params_.spacing, width + height);
+  half_chords_.resize(spacing_ + 1);
+  for (std::size_t dy = 0; dy <= spacing_; ++dy) {
+    const double squared = static_cast<double>(spacing_ * spacing_ - dy * dy);
+    half_chords_[dy] = static_cast<std::uint32_t>(std::sqrt(squared));
+  }
   memory::ResizeOnLargePages(luma_, width * height);
   memory::ResizeOnLargePages(mask_, width * height);
-  memory::ResizeOnLargePages(covered_, width * height);
+  covered_stride_ = (width + 63) / 64;
+  covered_.resize(covered_stride_ * height);
 
   // Gradients are taken on the image inset by the border less the window and 2 pixels of margin;
   // scores where the window, and one pixel more, fits into that.
@@ -141,10 +147,7 @@ void FeatureSelector::SelectAvoiding(const tracking_feature<float>* live_feature
   limit = static_cast<std::size_t>(std::min<std::uint64_t>(limit, params_.max_count));
   selected.clear();
   if (limit == 0) return;
-  if (++covered_mark_ == 0) {
-    std::fill(covered_.begin(), covered_.end(), std::uint8_t{0});
-    covered_mark_ = 1;
-  }
+  std::fill(covered_.begin(), covered_.end(), 0);
   for (std::size_t s = 0; s < count; ++s) {
     const auto& cell = live_features[s];
     if (cell.status >= 0) CoverDiscAroundFeature(cell.x, cell.y);
@@ -154,9 +157,9 @@ void FeatureSelector::SelectAvoiding(const tracking_feature<float>* live_feature
 
 void FeatureSelector::Select(std::size_t limit) {
   for (const Candidate& candidate : candidates) {
-    if (covered_[candidate.pixel] == covered_mark_) continue;
     const std::size_t column = candidate.pixel % width_;
     const std::size_t row = candidate.pixel / width_;
+    if (covered_[row * covered_stride_ + column / 64] >> column % 64 & 1) continue;
     selected.push_back({static_cast<float>(column), static_cast<float>(row), candidate.score});
     if (selected.size() == limit) return;
     CoverDiscAroundCandidate(static_cast<std::int64_t>(column), static_cast<std::int64_t>(row));
@@ -188,7 +191,7 @@ void FeatureSelector::CoverDiscAroundCandidate(std::int64_t column, std::int64_t
   for (std::int64_t y = first_row; y <= last_row; ++y) {
     const std::int64_t dy = y - row;
     const auto chord =
-        static_cast<std::int64_t>(std::sqrt(static_cast<double>(radius * radius - dy * dy)));
+        static_cast<std::int64_t>(half_chords_[static_cast<std::size_t>(std::abs(dy))]);
     CoverSpan(y, std::max<std::int64_t>(column - chord, 0),
               std::min(column + chord, static_cast<std::int64_t>(width_) - 1));
   }
@@ -196,8 +199,14 @@ void FeatureSelector::CoverDiscAroundCandidate(std::int64_t column, std::int64_t
 
 // Columns first to last, both included.
 void FeatureSelector::CoverSpan(std::int64_t row, std::int64_t first, std::int64_t last) {
-  std::uint8_t* pixels = covered_.data() + row * static_cast<std::int64_t>(width_);
-  std::fill(pixels + first, pixels + last + 1, covered_mark_);
+  std::uint64_t* words = covered_.data() + static_cast<std::size_t>(row) * covered_stride_;
+  const std::int64_t last_word = last / 64;
+  std::uint64_t bits = ~std::uint64_t{0} << first % 64;
+  for (std::int64_t word = first / 64; word < last_word; ++word) {
+    words[word] |= bits;
+    bits = ~std::uint64_t{0};
+  }
+  words[last_word] |= bits & ~std::uint64_t{0} >> (63 - last % 64);
 }
 
 }  // namespace marrow::tracking
