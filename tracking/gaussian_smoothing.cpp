@@ -20,11 +20,14 @@ namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
 using Floats = hn::CappedTag<float, RowFolding::kSegments>;
-constexpr std::size_t kAtOnce = SeparableSmoother::kAtOnce;
+// Neighbours that are made together: three vectors of each should fit into the registers, of which
+// processors with vectors this long have 32, others 16.
+constexpr std::size_t kAtOnce = HWY_MAX_BYTES >= 64 ? 8 : 4;
+static_assert(SeparableSmoother::kMostAtOnce % kAtOnce == 0);
 
 // taps[0] centre + sum over k of taps[k] (before(k) + after(k)), k ascending. Not fused into
-// multiply-adds: targets without them would round differently. kMany neighbours are made together:
-// from tap to tap each of them takes over what its neighbour had, so that two loads serve all.
+// multiply-adds: targets without them would round differently. Of kMany neighbours each takes over
+// what the next one had, from tap to tap, so that two loads serve all.
 // load(j) is the vector that lies radius - j before the first one made.
 template <std::size_t kMany, class Load, class Store>
 HWY_INLINE void Smooth(const float* taps, std::size_t radius, Load load, Store store) {
@@ -77,15 +80,14 @@ HWY_INLINE void SmoothRows(const float* taps, std::size_t radius, const float* c
   }
 }
 
-// rows[radius] lies at out's first row. `out_rows` is kAtOnce or less; count, of values, is a
-// multiple of RowFolding::kSegments.
+// rows[radius] lies at out's first row. count, of values, is a multiple of RowFolding::kSegments.
 void SmoothAlongY(const float* taps, std::size_t radius, const float* const* rows,
                   std::size_t count, std::size_t out_rows, float* out, std::size_t stride) {
-  if (out_rows == kAtOnce) {
-    SmoothRows<kAtOnce>(taps, radius, rows, count, out, stride);
-    return;
+  std::size_t j = 0;
+  for (; j + kAtOnce <= out_rows; j += kAtOnce) {
+    SmoothRows<kAtOnce>(taps, radius, rows + j, count, out + j * stride, stride);
   }
-  for (std::size_t j = 0; j < out_rows; ++j) {
+  for (; j < out_rows; ++j) {
     SmoothRows<1>(taps, radius, rows + j, count, out + j * stride, stride);
   }
 }
@@ -129,12 +131,12 @@ SeparableSmoother::SeparableSmoother(std::vector<float> kernel, std::size_t max_
   const std::size_t radius = taps_.size() - 1;
   const std::size_t positions = RowFolding{max_width}.positions();
   padded_.resize(positions * RowFolding::kSegments + kFoldingSlack);
-  folded_.resize(FoldedStride(positions + kFoldingSlack + 2 * radius + kAtOnce));
-  ring_stride_ = FoldedStride(positions + kAtOnce - 1);
-  rows_.resize(kernel.size() + kAtOnce - 1);
+  folded_.resize(FoldedStride(positions + kFoldingSlack + 2 * radius + kMostAtOnce));
+  ring_stride_ = FoldedStride(positions + kMostAtOnce - 1);
+  rows_.resize(kernel.size() + kMostAtOnce - 1);
   ring_.resize(ring_stride_ * rows_.size());
   smooth_stride_ = FoldedStride(positions + 2);
-  smooth_rows_ = (kept_rows + 2 * kAtOnce - 2) / kAtOnce * kAtOnce;
+  smooth_rows_ = (kept_rows + 2 * kMostAtOnce - 2) / kMostAtOnce * kMostAtOnce;
   smooth_.resize(smooth_stride_ * smooth_rows_);
 }
 
@@ -179,7 +181,7 @@ void SeparableSmoother::PutIntoRing(std::size_t y) {
 void SeparableSmoother::MakeRows() {
   const std::size_t radius = taps_.size() - 1;
   const std::size_t height = region_.y1 - region_.y0;
-  const std::size_t out_rows = std::min(kAtOnce, height - made_);
+  const std::size_t out_rows = std::min(kMostAtOnce, height - made_);
   for (; in_ring_ < std::min(height, made_ + out_rows + radius); ++in_ring_) PutIntoRing(in_ring_);
   for (std::size_t j = 0; j < out_rows + 2 * radius; ++j) {
     const std::size_t below = std::min(made_ + j, height - 1 + radius);

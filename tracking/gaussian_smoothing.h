@@ -25,8 +25,8 @@ std::vector<float> IntegratedGaussian(double sigma);
 // kernel {1} rows are the image's own values.
 class SeparableSmoother {
  public:
-  // Neighbours that a pass makes together: so many share what they read.
-  static constexpr std::size_t kAtOnce = 4;
+  // Neighbours that a pass makes together, at most: so many share what they read.
+  static constexpr std::size_t kMostAtOnce = 8;
 
   // An odd number of taps, symmetric about the middle one; lines of at most max_width pixels.
   // kept_rows: so many of the last rows stay at hand.
@@ -56,7 +56,7 @@ class SeparableSmoother {
   memory::LineAlignedVector<float> ring_;  // the rows that are at hand, smoothed along x
   std::vector<const float*> rows_;  // in the ring: those that a few neighbouring rows depend on
   std::size_t smooth_stride_;
-  std::size_t smooth_rows_;  // in smooth_, a multiple of kAtOnce
+  std::size_t smooth_rows_;  // in smooth_, a multiple of kMostAtOnce
   memory::LineAlignedVector<float>
       smooth_;  // the last rows, smoothed both ways, one after the other
   const std::uint8_t* image_ = nullptr;
