@@ -12,30 +12,6 @@
 #include "tracking/corner_score-inl.h"
 #include "tracking/multiplier_add-inl.h"
 
-#ifndef MARROW_TRACKING_GRADIENT_SUMS_RECORDS_
-#define MARROW_TRACKING_GRADIENT_SUMS_RECORDS_
-namespace marrow::tracking {
-namespace {
-
-// What the windows of a group of rows are put together from, at every position: planes of sums,
-// each plane of a kind a stride behind the one before.
-struct column_window {
-  std::size_t count;             // of values in a row, a multiple of RowFolding::kSegments
-  const float* const* leaving;   // rows from the one above the first window
-  const float* const* entering;  // rows from the one above the first that is in no whole group
-  const float* ends;         // of the block's groups from the first one on; null if there is none
-  const float* block_start;  // null where the whole groups end with their block
-  float* next_block_start;   // where ends is not null: with the group that is complete now
-  float* group;              // the same: that group
-  std::size_t group_stride;
-  float* sums;  // row after row, three planes each
-  std::size_t sum_stride;
-};
-
-}  // namespace
-}  // namespace marrow::tracking
-#endif
-
 HWY_BEFORE_NAMESPACE();
 namespace marrow::tracking {
 namespace HWY_NAMESPACE {
@@ -71,6 +47,7 @@ HWY_INLINE void StoreMatrix(const Matrix& m, float* planes, std::size_t stride) 
   hn::StoreU(m.xy, d, planes + 2 * stride);
 }
 
+// Of a pixel's differences along x and y; `row` lies between the other two.
 HWY_INLINE Matrix Products(Vec above, const float* row, Vec below) {
   const Floats d;
   const auto ix = hn::Sub(hn::LoadU(d, row + kSegments), hn::LoadU(d, row - kSegments));
@@ -78,9 +55,8 @@ HWY_INLINE Matrix Products(Vec above, const float* row, Vec below) {
   return {hn::Mul(ix, ix), hn::Mul(iy, iy), hn::Mul(ix, iy)};
 }
 
-// Sums of the products of kRows rows, rows[0] above the first of them. kUp: from the lowest row
-// upwards, take(row, sum from it to the lowest); else downwards, take(row, sum from the first).
-// The sums begin with *first, if there is one.
+// Runs over kRows rows, rows[0] above the first of them, with the sum of `first`, if there is one,
+// and the products so far: downwards, or with kUp from the lowest row upwards. take(row, sum).
 template <std::size_t kRows, bool kUp, class Take>
 HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, const Matrix* first,
                             Take take) {
@@ -99,11 +75,12 @@ HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, const Matri
   }
 }
 
-// Windows of kGroup rows one below the other. kRest: rows of the first window below the last group
-// that lies in it wholly.
+// Windows one below the other, kGroup of them. kRest: how many rows of the first one lie below its
+// last whole group.
 template <std::size_t kGroup, std::size_t kRest>
 HWY_INLINE void SumColumnWindows(const column_window& w) {
-  constexpr std::size_t kEntering = std::max(kGroup, kGroup + kRest - 1);
+  // The last window's, and a group at least, which the windows to come hold as a whole.
+  constexpr std::size_t kEntering = std::max(kGroup, kRest + kGroup - 1);
   for (std::size_t i = 0; i < w.count; i += hn::Lanes(Floats())) {
     Matrix windows[kGroup], group, start, whole;
     if (w.ends) {
@@ -114,15 +91,16 @@ HWY_INLINE void SumColumnWindows(const column_window& w) {
       }
     }
     SumProducts<kGroup, true>(w.leaving, i, w.ends ? &whole : nullptr,
-                              [&](std::size_t j, const Matrix& sum) HWY_ATTR { windows[j] = sum; });
-    SumProducts<kEntering, false>(w.entering, i, nullptr,
-                                  [&](std::size_t j, const Matrix& sum) HWY_ATTR {
-                                    if (j + 1 == kGroup) group = sum;
-                                    const std::size_t window = j + 1 - kRest;
-                                    if (j + 1 >= kRest && window < kGroup && kRest > 0) {
-                                      windows[window] = AddByMultiplier(windows[window], sum);
-                                    }
-                                  });
+                              [&](std::size_t row, const Matrix& sum)
+                                  HWY_ATTR { windows[row] = sum; });
+    const auto enter = [&](std::size_t row, const Matrix& sum) HWY_ATTR {
+      const std::size_t rows = row + 1;
+      if (rows == kGroup) group = sum;
+      if (kRest == 0 || rows < kRest || rows - kRest >= kGroup) return;
+      Matrix& window = windows[rows - kRest];
+      window = AddByMultiplier(window, sum);
+    };
+    SumProducts<kEntering, false>(w.entering, i, nullptr, enter);
     for (std::size_t j = 0; j < kGroup; ++j) {
       StoreMatrix(windows[j], w.sums + 3 * j * w.sum_stride + i, w.sum_stride);
     }
@@ -134,18 +112,20 @@ HWY_INLINE void SumColumnWindows(const column_window& w) {
   }
 }
 
-// Calls sum with std::integral_constant of group and rest.
+template <std::size_t kValue>
+using Constant = std::integral_constant<std::size_t, kValue>;
+
+// call(group, rest), as constants. See GroupFor.
 template <class Call>
 HWY_INLINE void WithGroup(std::size_t group, std::size_t rest, Call call) {
-  using std::integral_constant;
   if (group == 6) {
-    call(integral_constant<std::size_t, 6>(), integral_constant<std::size_t, 1>());
+    call(Constant<6>(), Constant<1>());
   } else if (group == 1) {
-    call(integral_constant<std::size_t, 1>(), integral_constant<std::size_t, 0>());
+    call(Constant<1>(), Constant<0>());
   } else if (rest == 1) {
-    call(integral_constant<std::size_t, 4>(), integral_constant<std::size_t, 1>());
+    call(Constant<4>(), Constant<1>());
   } else {
-    call(integral_constant<std::size_t, 4>(), integral_constant<std::size_t, 3>());
+    call(Constant<4>(), Constant<3>());
   }
 }
 

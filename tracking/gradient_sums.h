@@ -21,6 +21,21 @@ struct gradient_sum_row {
 // row again while it is at most a given number of rows above the lowest one they have seen.
 using ImageRows = std::function<const float*(std::size_t y)>;
 
+// What GradientSums makes a group of rows of windows from, along y alone. Sums are three planes, a
+// stride apart.
+struct column_window {
+  std::size_t count;             // of values in a row, a multiple of RowFolding::kSegments
+  const float* const* leaving;   // image rows from the one above the first window
+  const float* const* entering;  // from the one above those below the first window's whole groups
+  const float* ends;         // from its first whole group to the block's end; null: there is none
+  const float* block_start;  // of its whole groups in the next block; null: there is none
+  float* group;              // where the first group of the entering rows goes,
+  float* next_block_start;   // and the next block as far as that group; both as `ends`
+  std::size_t group_stride;
+  float* sums;  // row after row
+  std::size_t sum_stride;
+};
+
 // The gradient matrix of each pixel's window, row by row from the top: sums over (2 half_win_x + 1)
 // by (2 half_win_y + 1) pixels of Ix Ix, Iy Iy and Ix Iy, where Ix = I(x + 1, y) - I(x - 1, y) and
 // Iy likewise, not halved.

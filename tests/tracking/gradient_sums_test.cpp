@@ -57,10 +57,10 @@ void ForEachSum(const std::vector<float>& image, int width, int hx, int hy, Take
 }
 
 // Windows lower than a group of rows, of every remainder over whole groups, and wider than a
-// segment.
-constexpr std::pair<int, int> kHalfWindows[] = {{0, 0}, {1, 1},  {2, 2},   {0, 5},
-                                                {1, 3}, {3, 4},  {6, 0},   {5, 2},
-                                                {9, 9}, {15, 8}, {15, 15}, {20, 20}};
+// segment is long.
+constexpr std::pair<int, int> kHalfWindows[] = {{0, 0},  {1, 1},  {2, 2},   {0, 5},  {1, 3},
+                                                {3, 4},  {6, 0},  {5, 2},   {4, 7},  {9, 9},
+                                                {2, 11}, {15, 8}, {15, 15}, {20, 20}};
 
 TEST(GradientSumsTest, WindowSumsOfWholeNumbersAreExactAtEverySize) {
   std::mt19937 random(11);
