@@ -8,7 +8,7 @@
 #include <random>
 #include <vector>
 
-#include "tracking/corner_score.h"
+#include "tracking/score_maxima.h"
 
 // Milliseconds a frame of the selector, whole and by stages, beside plain passes over whole images
 // and OpenCV's goodFeaturesToTrack on one thread with the same window, spacing and count.
@@ -94,25 +94,33 @@ void PresmoothingOpenCv(benchmark::State& state) {
   }
 }
 
-// Stages 1 to 3: gradient sums; with scores; with maxima. Each includes the ones before.
+// Stages 1 to 3: gradient sums; scores in their place; with maxima.
 template <int kStages>
 void RowStages(benchmark::State& state) {
   const SelectorParams params = Params(state);
   const std::size_t w = state.range(0), h = state.range(1), inset = params.half_winx + 1;
-  const std::vector<float> image = FloatScene(w, h);
+  const std::vector<std::uint8_t> scene = Scene(w, h);
+  SeparableSmoother unsmoothed({1.0f}, w, h);
+  unsmoothed.Start(scene.data(), w, {0, 0, w, h});
+  unsmoothed.Row(h - 1);
+  const RowFolding& folding = unsmoothed.folding();
   GradientSums sums(params.half_winx, params.half_winy, w);
-  const std::size_t columns = w - 2 * inset;
-  std::vector<float> scores(3 * columns);
-  std::vector<std::uint32_t> maxima;
+  const std::size_t stride = FoldedStride(folding.positions() + 2);
+  memory::LineAlignedVector<float> scores(3 * stride);
+  std::vector<score_maximum> maxima;
   for (auto _ : state) {
-    sums.Start([&](std::size_t y) { return image.data() + y * w; },
-               {inset, inset, w - inset, h - inset});
+    sums.Start([&](std::size_t y) { return unsmoothed.Row(y); }, w, inset, h - 2 * inset);
     maxima.clear();
     for (std::size_t y = 0; y < h - 2 * inset; ++y) {
-      const auto row = [&](std::size_t r) { return &scores[r % 3 * columns]; };
-      const gradient_sum_row sum = sums.NextRow();
-      if (kStages > 1) ScoreRow(sum, columns, params.eig_ratio_threshold, row(y));
-      if (kStages > 2 && y > 1) FindMaxima(row(y - 2), row(y - 1), row(y), columns, 441.0f, maxima);
+      const auto row = [&](std::size_t r) {
+        return &scores[r % 3 * stride + RowFolding::kSegments];
+      };
+      if (kStages == 1) sums.NextRow();
+      if (kStages > 1) sums.NextScores(params.eig_ratio_threshold, row(y));
+      if (kStages > 2) FillHalo(row(y), folding.positions(), 1, 0.0f, 0.0f);
+      if (kStages > 2 && y > 1) {
+        FindMaxima(row(y - 2), row(y - 1), row(y), folding, inset, w - inset - 1, 441.0f, maxima);
+      }
       benchmark::ClobberMemory();
     }
   }

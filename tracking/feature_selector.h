@@ -6,8 +6,10 @@
 #include <memory>
 #include <vector>
 
+#include "platform/memory/line_aligned.h"
 #include "tracking/gaussian_smoothing.h"
 #include "tracking/gradient_sums.h"
+#include "tracking/score_maxima.h"
 #include "tracking/selector_params.h"
 #include "tracking/track_store.h"
 
@@ -67,16 +69,17 @@ class FeatureSelector {
   std::size_t width_ = 0;
   std::size_t height_ = 0;
   std::size_t spacing_ = 0;
+  std::vector<std::uint32_t> half_chords_;  // of the disc about a candidate, by distance in rows
   PixelRegion smoothing_region_{};
   PixelRegion scoring_region_{};
   std::vector<std::uint8_t> luma_;
   std::vector<std::uint8_t> mask_;
-  std::vector<std::uint8_t> covered_;  // by pixel: the mark of the last selection with a disc on it
-  std::uint8_t covered_mark_ = 0;
+  std::size_t covered_stride_ = 0;
+  std::vector<std::uint64_t> covered_;  // a bit for each pixel; rows are whole words
   std::unique_ptr<SeparableSmoother> smoother_;
   std::unique_ptr<GradientSums> gradient_sums_;
-  std::vector<float> score_rows_;  // the last three rows of scores
-  std::vector<std::uint32_t> maxima_;
+  memory::LineAlignedVector<float> score_rows_;  // the last three rows of scores, folded
+  std::vector<score_maximum> maxima_;
 };
 
 }  // namespace marrow::tracking

@@ -1,6 +1,7 @@
 #include "tracking/gradient_sums.h"
 
 #include <algorithm>
+#include <type_traits>
 #include <utility>
 
 #undef HWY_TARGET_INCLUDE
@@ -8,133 +9,204 @@
 #include <hwy/foreach_target.h>
 #include <hwy/highway.h>
 
+#include "tracking/corner_score-inl.h"
+#include "tracking/multiplier_add-inl.h"
+
 HWY_BEFORE_NAMESPACE();
 namespace marrow::tracking {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
-// Lanes of the sums. The products' vectors have as many floats.
-using Sums = hn::CappedTag<double, 8>;
+constexpr std::size_t kSegments = RowFolding::kSegments;
+using Floats = hn::CappedTag<float, kSegments>;
+using Vec = hn::Vec<Floats>;
 
-template <class D>
-struct Products {
-  hn::Vec<D> xx, yy, xy;
+struct Matrix {
+  Vec xx, yy, xy;
 };
 
-// Of the pixels from column x: reads one pixel more to each side.
-template <class D>
-HWY_INLINE Products<D> ProductsAt(D d, const row_triple& rows, std::size_t x) {
-  const float* row = rows.row + x;
-  const auto ix = hn::Sub(hn::LoadU(d, row + 1), hn::LoadU(d, row - 1));
-  const auto iy = hn::Sub(hn::LoadU(d, rows.below + x), hn::LoadU(d, rows.above + x));
+HWY_INLINE Matrix Add(const Matrix& a, const Matrix& b) {
+  return {hn::Add(a.xx, b.xx), hn::Add(a.yy, b.yy), hn::Add(a.xy, b.xy)};
+}
+
+HWY_INLINE Matrix AddByMultiplier(const Matrix& a, const Matrix& b) {
+  const Floats d;
+  return {AddByMultiplier(d, a.xx, b.xx), AddByMultiplier(d, a.yy, b.yy),
+          AddByMultiplier(d, a.xy, b.xy)};
+}
+
+HWY_INLINE Matrix LoadMatrix(const float* planes, std::size_t stride) {
+  const Floats d;
+  return {hn::LoadU(d, planes), hn::LoadU(d, planes + stride), hn::LoadU(d, planes + 2 * stride)};
+}
+
+HWY_INLINE void StoreMatrix(const Matrix& m, float* planes, std::size_t stride) {
+  const Floats d;
+  hn::StoreU(m.xx, d, planes);
+  hn::StoreU(m.yy, d, planes + stride);
+  hn::StoreU(m.xy, d, planes + 2 * stride);
+}
+
+// Of a pixel's differences along x and y; `row` lies between the other two.
+HWY_INLINE Matrix Products(Vec above, const float* row, Vec below) {
+  const Floats d;
+  const auto ix = hn::Sub(hn::LoadU(d, row + kSegments), hn::LoadU(d, row - kSegments));
+  const auto iy = hn::Sub(below, above);
   return {hn::Mul(ix, ix), hn::Mul(iy, iy), hn::Mul(ix, iy)};
 }
 
-// Adds an image row's products to the sums of their columns and, with kMove, takes another's away.
-template <bool kMove, class D>
-HWY_INLINE void UpdateColumns(D d, const row_triple& entering, const row_triple& leaving,
-                              std::size_t x, std::size_t plane, double* column) {
-  const hn::Rebind<float, D> df;
-  const auto in = ProductsAt(df, entering, x);
-  if constexpr (kMove) {
-    const auto out = ProductsAt(df, leaving, x);
-    const auto move = [&](auto from, auto to, double* sum) HWY_ATTR {
-      const auto change = hn::Sub(hn::PromoteTo(d, from), hn::PromoteTo(d, to));
-      hn::StoreU(hn::Add(hn::LoadU(d, sum), change), d, sum);
+// Runs over kRows rows, rows[0] above the first of them, with the sum of `first`, if there is one,
+// and the products so far: downwards, or with kUp from the lowest row upwards. take(row, sum).
+template <std::size_t kRows, bool kUp, class Take>
+HWY_INLINE void SumProducts(const float* const* rows, std::size_t i, const Matrix* first,
+                            Take take) {
+  const Floats d;
+  const auto at = [=](std::size_t j) HWY_ATTR { return rows[kUp ? kRows + 1 - j : j] + i; };
+  Matrix sum;
+  auto behind = hn::LoadU(d, at(0));
+  auto middle = hn::LoadU(d, at(1));
+  for (std::size_t j = 0; j < kRows; ++j) {
+    const auto ahead = hn::LoadU(d, at(j + 2));
+    const Matrix m = kUp ? Products(ahead, at(j + 1), behind) : Products(behind, at(j + 1), ahead);
+    sum = j > 0 ? Add(sum, m) : first ? Add(*first, m) : m;
+    take(kUp ? kRows - 1 - j : j, sum);
+    behind = middle;
+    middle = ahead;
+  }
+}
+
+// Windows one below the other, kGroup of them. kRest: how many rows of the first one lie below its
+// last whole group.
+template <std::size_t kGroup, std::size_t kRest>
+HWY_INLINE void SumColumnWindows(const column_window& w) {
+  // The last window's, and a group at least, which the windows to come hold as a whole.
+  constexpr std::size_t kEntering = std::max(kGroup, kRest + kGroup - 1);
+  for (std::size_t i = 0; i < w.count; i += hn::Lanes(Floats())) {
+    Matrix windows[kGroup], group, start, whole;
+    if (w.ends) {
+      whole = LoadMatrix(w.ends + i, w.group_stride);
+      if (w.block_start) {
+        start = LoadMatrix(w.block_start + i, w.group_stride);
+        whole = Add(whole, start);
+      }
+    }
+    SumProducts<kGroup, true>(w.leaving, i, w.ends ? &whole : nullptr,
+                              [&](std::size_t row, const Matrix& sum)
+                                  HWY_ATTR { windows[row] = sum; });
+    const auto enter = [&](std::size_t row, const Matrix& sum) HWY_ATTR {
+      const std::size_t rows = row + 1;
+      if (rows == kGroup) group = sum;
+      if (kRest == 0 || rows < kRest || rows - kRest >= kGroup) return;
+      Matrix& window = windows[rows - kRest];
+      window = AddByMultiplier(window, sum);
     };
-    move(in.xx, out.xx, column);
-    move(in.yy, out.yy, column + plane);
-    move(in.xy, out.xy, column + 2 * plane);
+    SumProducts<kEntering, false>(w.entering, i, nullptr, enter);
+    for (std::size_t j = 0; j < kGroup; ++j) {
+      StoreMatrix(windows[j], w.sums + 3 * j * w.sum_stride + i, w.sum_stride);
+    }
+    if (w.ends) {
+      StoreMatrix(group, w.group + i, w.group_stride);
+      StoreMatrix(w.block_start ? Add(start, group) : group, w.next_block_start + i,
+                  w.group_stride);
+    }
+  }
+}
+
+template <std::size_t kValue>
+using Constant = std::integral_constant<std::size_t, kValue>;
+
+// call(group, rest), as constants. See GroupFor.
+template <class Call>
+HWY_INLINE void WithGroup(std::size_t group, std::size_t rest, Call call) {
+  if (group == 6) {
+    call(Constant<6>(), Constant<1>());
+  } else if (group == 1) {
+    call(Constant<1>(), Constant<0>());
+  } else if (rest == 1) {
+    call(Constant<4>(), Constant<1>());
   } else {
-    const auto add = [&](auto from, double* sum) HWY_ATTR {
-      hn::StoreU(hn::Add(hn::LoadU(d, sum), hn::PromoteTo(d, from)), d, sum);
-    };
-    add(in.xx, column);
-    add(in.yy, column + plane);
-    add(in.xy, column + 2 * plane);
+    call(Constant<4>(), Constant<3>());
   }
 }
 
-// v with lane j moved to lane j + kShift, and 0 in the first ones.
-template <std::size_t kShift, class D, class V>
-HWY_INLINE V MoveUp(D d, V v) {
-  const hn::RebindToSigned<D> di;
-  const auto lane = hn::Iota(di, 0);
-  const auto shift = hn::Set(di, static_cast<std::int64_t>(kShift));
-  const auto from = hn::Max(hn::Sub(lane, shift), hn::Zero(di));
-  const auto moved = hn::TableLookupLanes(v, hn::IndicesFromVec(d, from));
-  return hn::IfThenElseZero(hn::RebindMask(d, hn::Gt(hn::Iota(di, 1), shift)), moved);
+void SumColumns(const column_window& w, std::size_t group, std::size_t rest) {
+  WithGroup(group, rest, [&w](auto g, auto r) HWY_ATTR { SumColumnWindows<g(), r()>(w); });
 }
 
-template <class D, class V>
-HWY_INLINE V LastLane(D d, V v) {
-  const hn::RebindToSigned<D> di;
-  const auto last = hn::Set(di, static_cast<std::int64_t>(hn::Lanes(d)) - 1);
-  return hn::TableLookupLanes(v, hn::IndicesFromVec(d, last));
+void SumGroup(const float* const* rows, std::size_t group_rows, std::size_t count, float* group,
+              std::size_t stride) {
+  WithGroup(group_rows, 1, [=](auto g, auto) HWY_ATTR {
+    for (std::size_t i = 0; i < count; i += hn::Lanes(Floats())) {
+      Matrix sum;
+      SumProducts<g(), false>(rows, i, nullptr,
+                              [&](std::size_t, const Matrix& so_far) HWY_ATTR { sum = so_far; });
+      StoreMatrix(sum, group + i, stride);
+    }
+  });
 }
 
-// Runs along a row with the sum over the window's columns, a vector of places at a time: their
-// differences from the place before are added up within the vector, then to the sum so far. With
-// kMove the columns' sums are first moved down by one image row.
-template <bool kMove>
-HWY_INLINE void SumRow(const gradient_sum_planes& planes, const row_triple& entering,
-                       const row_triple& leaving, double* column_sums, float* sums) {
-  const Sums d;
-  const hn::Rebind<float, Sums> df;
-  constexpr std::size_t N = hn::MaxLanes(Sums());
-  double* columns = column_sums + planes.window;
-  hn::Vec<Sums> running[3] = {hn::Zero(d), hn::Zero(d), hn::Zero(d)};
-  const auto sum_window = [&](std::size_t x) HWY_ATTR {
-    for (std::size_t p = 0; p < 3; ++p) {
-      const double* column = columns + p * planes.column_stride + x;
-      auto change = hn::Sub(hn::LoadU(d, column), hn::LoadU(d, column - planes.window));
-      if constexpr (N > 1) change = hn::Add(change, MoveUp<1>(d, change));
-      if constexpr (N > 2) change = hn::Add(change, MoveUp<2>(d, change));
-      if constexpr (N > 4) change = hn::Add(change, MoveUp<4>(d, change));
-      const auto sum = hn::Add(running[p], change);
-      hn::StoreU(hn::DemoteTo(df, sum), df, sums + p * planes.sum_stride + x);
-      running[p] = LastLane(d, sum);
-    }
-  };
-  std::size_t x = 0;
-  for (; x + N <= planes.columns; x += N) {
-    if constexpr (kMove) {
-      UpdateColumns<true>(d, entering, leaving, x, planes.column_stride, columns + x);
-    }
-    sum_window(x);
-  }
-  if (x == planes.columns) return;
-  if constexpr (kMove) {
-    for (std::size_t i = x; i < planes.columns; ++i) {
-      UpdateColumns<true>(hn::CappedTag<double, 1>(), entering, leaving, i, planes.column_stride,
-                          columns + i);
+// Turns the sums of a block's groups into sums from each group to the end of the block.
+void SumToEnds(std::size_t groups, std::size_t count, float* planes, std::size_t stride) {
+  const Floats d;
+  for (std::size_t p = 0; p < 3; ++p) {
+    for (std::size_t i = 0; i < count; i += hn::Lanes(d)) {
+      float* at = planes + (3 * (groups - 1) + p) * stride + i;
+      auto sum = hn::LoadU(d, at);
+      for (std::size_t g = groups - 1; g > 0; --g) {
+        at -= 3 * stride;
+        sum = hn::Add(hn::LoadU(d, at), sum);
+        hn::StoreU(sum, d, at);
+      }
     }
   }
-  sum_window(x);
 }
 
-void AddToColumns(const gradient_sum_planes& planes, const row_triple& entering,
-                  double* column_sums) {
-  const Sums d;
-  const std::size_t N = hn::Lanes(d);
-  double* columns = column_sums + planes.window;
-  std::size_t x = 0;
-  for (; x + N <= planes.columns; x += N) {
-    UpdateColumns<false>(d, entering, {}, x, planes.column_stride, columns + x);
+// Windows along x. `columns` begins half a window before the first position; `ends` has room for a
+// window. take(index in a row, sums).
+template <class Take>
+HWY_INLINE void SumWindows(const float* HWY_RESTRICT columns, std::size_t column_stride,
+                           std::size_t window, std::size_t positions, float* HWY_RESTRICT ends,
+                           Take take) {
+  const std::size_t ends_stride = window * kSegments;
+  for (std::size_t first = 0; first < positions; first += window) {
+    const std::size_t here = std::min(window, positions - first);
+    for (std::size_t i = 0; i < kSegments; i += hn::Lanes(Floats())) {
+      const float* block = columns + first * kSegments + i;
+      Matrix sum = LoadMatrix(block + (window - 1) * kSegments, column_stride);
+      StoreMatrix(sum, ends + (window - 1) * kSegments + i, ends_stride);
+      for (std::size_t p = window - 1; p > 0; --p) {
+        sum = Add(LoadMatrix(block + (p - 1) * kSegments, column_stride), sum);
+        StoreMatrix(sum, ends + (p - 1) * kSegments + i, ends_stride);
+      }
+      take(first * kSegments + i, sum);
+      const float* next = block + window * kSegments;
+      Matrix start;
+      for (std::size_t p = 1; p < here; ++p) {
+        const Matrix m = LoadMatrix(next + (p - 1) * kSegments, column_stride);
+        start = p == 1 ? m : Add(start, m);
+        take((first + p) * kSegments + i,
+             AddByMultiplier(LoadMatrix(ends + p * kSegments + i, ends_stride), start));
+      }
+    }
   }
-  for (; x < planes.columns; ++x) {
-    UpdateColumns<false>(hn::CappedTag<double, 1>(), entering, {}, x, planes.column_stride,
-                         columns + x);
-  }
 }
 
-void SumFirstRow(const gradient_sum_planes& planes, double* column_sums, float* sums) {
-  SumRow<false>(planes, {}, {}, column_sums, sums);
+void SumRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
+            std::size_t positions, float* HWY_RESTRICT ends, float* HWY_RESTRICT sums,
+            std::size_t sum_stride) {
+  SumWindows(columns, column_stride, window, positions, ends,
+             [=](std::size_t i, const Matrix& m)
+                 HWY_ATTR { StoreMatrix(m, sums + i, sum_stride); });
 }
 
-void SumNextRow(const gradient_sum_planes& planes, const row_triple& entering,
-                const row_triple& leaving, double* column_sums, float* sums) {
-  SumRow<true>(planes, entering, leaving, column_sums, sums);
+void ScoreRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
+              std::size_t positions, float* HWY_RESTRICT ends, float most_ratio,
+              float* HWY_RESTRICT scores) {
+  const Floats d;
+  const auto ratio = hn::Set(d, most_ratio);
+  SumWindows(columns, column_stride, window, positions, ends,
+             [=](std::size_t i, const Matrix& m)
+                 HWY_ATTR { hn::StoreU(CornerScore(d, m.xx, m.yy, m.xy, ratio), d, scores + i); });
 }
 
 }  // namespace HWY_NAMESPACE
@@ -145,54 +217,116 @@ HWY_AFTER_NAMESPACE();
 namespace marrow::tracking {
 namespace {
 
-HWY_EXPORT(AddToColumns);
-HWY_EXPORT(SumFirstRow);
-HWY_EXPORT(SumNextRow);
+HWY_EXPORT(SumColumns);
+HWY_EXPORT(SumGroup);
+HWY_EXPORT(SumToEnds);
+HWY_EXPORT(SumRow);
+HWY_EXPORT(ScoreRow);
 
-constexpr std::size_t kMostLanes = 8;
+constexpr std::size_t kMostGroup = 6;
+
+// Rows in a group. Of a window of whole groups and one row, as many rows enter as leave; with three
+// rows over, two of those that enter are formed a second time for the next group.
+std::size_t GroupFor(std::size_t window) {
+  if (window < 5) return 1;
+  return window % 6 == 1 ? 6 : 4;
+}
 
 }  // namespace
 
 GradientSums::GradientSums(std::size_t half_win_x, std::size_t half_win_y, std::size_t max_width)
-    : half_win_x_(half_win_x),
-      half_win_y_(half_win_y),
-      planes_{0, 2 * half_win_x + 1, 2 * half_win_x + 1 + max_width + kMostLanes,
-              max_width + kMostLanes},
-      column_sums_(3 * planes_.column_stride),
-      sums_(3 * planes_.sum_stride) {}
-
-void GradientSums::Start(ImageRows rows, const PixelRegion& region) {
-  rows_ = std::move(rows);
-  planes_.columns = region.x1 - region.x0 + 2 * half_win_x_;
-  left_ = region.x0 - half_win_x_;
-  window_top_ = region.y0 - half_win_y_;
-  started_ = false;
-  std::fill(column_sums_.begin(), column_sums_.end(), 0.0);
+    : window_x_(2 * half_win_x + 1),
+      window_y_(2 * half_win_y + 1),
+      group_(GroupFor(window_y_)),
+      rest_(group_ == 1 ? 0 : window_y_ % group_),
+      whole_(window_y_ / group_ - 1) {
+  const std::size_t positions = RowFolding{max_width}.positions();
+  group_stride_ = sum_stride_ = FoldedStride(positions);
+  column_stride_ = FoldedStride(positions + window_x_ - 1);
+  groups_.resize(whole_ * 3 * group_stride_);
+  block_start_.resize(3 * group_stride_);
+  column_sums_.resize(group_ * 3 * column_stride_);
+  ends_.resize(3 * window_x_ * RowFolding::kSegments);
+  sums_.resize(3 * sum_stride_);
 }
 
-// The lowest one first: what it pushes out is not read again.
-row_triple GradientSums::RowsAbout(std::size_t y) const {
-  const float* below = rows_(y + 1) + left_;
-  return {rows_(y - 1) + left_, rows_(y) + left_, below};
+void GradientSums::Start(ImageRows image, std::size_t columns, std::size_t first_row,
+                         std::size_t rows) {
+  image_ = std::move(image);
+  positions_ = RowFolding{columns}.positions();
+  window_top_ = first_row - window_y_ / 2;
+  last_row_ = first_row + rows + window_y_ / 2;
+  next_ = 0;
+}
+
+const float* GradientSums::NextColumnSums() {
+  if (next_ % group_ == 0) SumNextColumns();
+  return column_sums_.data() + next_++ % group_ * 3 * column_stride_;
 }
 
 gradient_sum_row GradientSums::NextRow() {
-  const std::size_t window_rows = 2 * half_win_y_ + 1;
-  if (!started_) {
-    for (std::size_t v = 0; v < window_rows; ++v) {
-      HWY_DYNAMIC_DISPATCH(AddToColumns)
-      (planes_, RowsAbout(window_top_ + v), column_sums_.data());
-    }
-    HWY_DYNAMIC_DISPATCH(SumFirstRow)(planes_, column_sums_.data(), sums_.data());
-    started_ = true;
-  } else {
-    const row_triple entering = RowsAbout(window_top_ + window_rows);
-    HWY_DYNAMIC_DISPATCH(SumNextRow)
-    (planes_, entering, RowsAbout(window_top_), column_sums_.data(), sums_.data());
-    ++window_top_;
+  HWY_DYNAMIC_DISPATCH(SumRow)
+  (NextColumnSums(), column_stride_, window_x_, positions_, ends_.data(), sums_.data(),
+   sum_stride_);
+  return {sums_.data(), sums_.data() + sum_stride_, sums_.data() + 2 * sum_stride_};
+}
+
+void GradientSums::NextScores(float eig_ratio_threshold, float* scores) {
+  HWY_DYNAMIC_DISPATCH(ScoreRow)
+  (NextColumnSums(), column_stride_, window_x_, positions_, ends_.data(), eig_ratio_threshold,
+   scores);
+}
+
+// Past the last row that windows depend on, it repeats: for rows of a group that nobody asks for.
+void GradientSums::FindRows(std::size_t first, std::size_t count, const float** rows) const {
+  for (std::size_t j = 0; j < count; ++j) rows[j] = image_(std::min(first + j, last_row_));
+}
+
+void GradientSums::SumNextColumns() {
+  const std::size_t group_index = next_ / group_;
+  const std::size_t count = positions_ * RowFolding::kSegments;
+  if (group_index == 0) SumFirstGroups();
+
+  // The lowest row first: what it pushes out is not read again.
+  const float* rows[2 * kMostGroup + 6];
+  const std::size_t leaving = group_ + 2;
+  const std::size_t entering = std::max(group_, group_ + rest_ - 1) + 2;
+  FindRows(window_top_ + (whole_ + 1) * group_ - 1, entering, rows + leaving);
+  FindRows(window_top_ - 1, leaving, rows);
+
+  column_window w{};
+  w.count = count;
+  w.leaving = rows;
+  w.entering = rows + leaving;
+  if (whole_ > 0) {
+    const std::size_t in_block = group_index % whole_;
+    w.ends = w.group = GroupSums(in_block);
+    w.block_start = in_block > 0 ? block_start_.data() : nullptr;
+    w.next_block_start = block_start_.data();
   }
-  const float* first = sums_.data() + 2 * half_win_x_;
-  return {first, first + planes_.sum_stride, first + 2 * planes_.sum_stride};
+  w.group_stride = group_stride_;
+  w.sums = column_sums_.data() + (window_x_ / 2) * RowFolding::kSegments;
+  w.sum_stride = column_stride_;
+  HWY_DYNAMIC_DISPATCH(SumColumns)(w, group_, rest_);
+  if (whole_ > 0 && group_index % whole_ == whole_ - 1) {
+    HWY_DYNAMIC_DISPATCH(SumToEnds)(whole_, count, groups_.data(), group_stride_);
+  }
+  for (std::size_t plane = 0; plane < 3 * group_; ++plane) {
+    FillHalo(w.sums + plane * column_stride_, positions_, window_x_ / 2, 0.0f, 0.0f);
+  }
+  window_top_ += group_;
+}
+
+// Those that lie wholly inside the windows of the first group of rows.
+void GradientSums::SumFirstGroups() {
+  if (whole_ == 0) return;
+  const std::size_t count = positions_ * RowFolding::kSegments;
+  const float* rows[kMostGroup + 2];
+  for (std::size_t g = 0; g < whole_; ++g) {
+    FindRows(window_top_ + (g + 1) * group_ - 1, group_ + 2, rows);
+    HWY_DYNAMIC_DISPATCH(SumGroup)(rows, group_, count, GroupSums(g), group_stride_);
+  }
+  HWY_DYNAMIC_DISPATCH(SumToEnds)(whole_, count, groups_.data(), group_stride_);
 }
 
 }  // namespace marrow::tracking
