@@ -78,7 +78,6 @@ class FeatureTracker {
                     TrackingStatistics& statistics);
   bool VerifyFeature(const ImagePyramid& current, feature_slot& slot, float limit,
                      tracking_feature<float>& cell, TrackingStatistics& statistics);
-  offset_planes offsets() const { return {offset_u_.data(), offset_v_.data()}; }
 
   std::size_t levels_;
   int max_iterations_;
@@ -89,10 +88,7 @@ class FeatureTracker {
   float dark_threshold_;
   solver_tolerances tolerances_;
   window_shape shape_;
-  std::vector<float> offset_u_;
-  std::vector<float> offset_v_;
-  std::vector<float> scratch_;
-  std::vector<float> window_;  // the last sample
+  WindowStack sample_;  // of one level: the last sample
   WindowStack translation_stack_;
   translation_normal translation_normal_;  // of the level that was last prepared
   std::vector<feature_slot> slots_;        // empty without verification
