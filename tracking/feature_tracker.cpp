@@ -24,9 +24,7 @@ struct FeatureTracker::translation_stage {
   float x, y;
   color_mode mode;
   std::size_t levels_sampled = 0;
-  bool prepared = false;
-  std::size_t prepared_level = 0;
-  bool singular = false;
+  std::size_t levels_prepared = 0;
 
   void SampleTo(std::size_t level) {
     for (; levels_sampled <= level; ++levels_sampled) {
@@ -37,14 +35,15 @@ struct FeatureTracker::translation_stage {
   int Solve(std::size_t level, AffineState& state) {
     SampleTo(level);
     const float* t = tracker.translation_stack_.Level(level);
-    if (!prepared || prepared_level != level) {
-      prepared = true;
-      prepared_level = level;
-      singular = !PrepareTranslation(t, tracker.shape_, mode, tracker.translation_normal_);
+    for (; levels_prepared <= level; ++levels_prepared) {
+      translation_level& next = tracker.translation_levels_[levels_prepared];
+      next.singular = !PrepareTranslation(tracker.translation_stack_.Level(levels_prepared),
+                                          tracker.shape_, mode, next.normal);
     }
-    if (singular) return kLevelFailed;
-    return SolveTranslation(t, tracker.shape_, tracker.translation_normal_, current.Level(level),
-                            mode, tracker.tolerances_, tracker.max_iterations_, state,
+    const translation_level& prepared = tracker.translation_levels_[level];
+    if (prepared.singular) return kLevelFailed;
+    return SolveTranslation(t, tracker.shape_, prepared.normal, current.Level(level), mode,
+                            tracker.tolerances_, tracker.max_iterations_, state,
                             tracker.sample_.Level(0));
   }
 
@@ -103,7 +102,8 @@ FeatureTracker::FeatureTracker(const TrackerParams& params, std::size_t feature_
                   static_cast<float>(params.tolerance_color_delta)},
       shape_{params.half_win_x, params.half_win_x, channels},
       sample_(shape_.half_x, shape_.half_y, channels, 1),
-      translation_stack_(shape_.half_x, shape_.half_y, channels, levels_) {
+      translation_stack_(shape_.half_x, shape_.half_y, channels, levels_),
+      translation_levels_(levels_) {
   if (!verification_) return;
   slots_.resize(feature_count);
   for (feature_slot& slot : slots_) {

@@ -53,6 +53,10 @@ class FeatureTracker {
  private:
   // What depends on one level of a template alone, computed when it is first needed.
   enum class readiness : unsigned char { unknown, ready, singular };
+  struct translation_level {
+    bool singular = false;
+    translation_normal normal;
+  };
   struct affine_level {
     readiness normal_state = readiness::unknown;
     bool has_moments = false;
@@ -90,8 +94,8 @@ class FeatureTracker {
   window_shape shape_;
   WindowStack sample_;  // of one level: the last sample
   WindowStack translation_stack_;
-  translation_normal translation_normal_;  // of the level that was last prepared
-  std::vector<feature_slot> slots_;        // empty without verification
+  std::vector<translation_level> translation_levels_;
+  std::vector<feature_slot> slots_;  // empty without verification
 };
 
 }  // namespace marrow::tracking

@@ -655,9 +655,14 @@ void GradientProducts(const float* t, const window_shape& shape, double sums[3])
     auto xy = products[1].At(d, i);
     auto yy = products[2].At(d, i);
     const float* p = t + i;
+    auto above = hn::LoadU(d, p - stride);
+    auto here = hn::LoadU(d, p);
     for (std::size_t row = 0; row < shape.rows(); ++row, p += stride) {
+      const auto below = hn::LoadU(d, p + stride);
       const auto gx = keep(hn::Sub(hn::LoadU(d, p + C), hn::LoadU(d, p - C)));
-      const auto gy = keep(hn::Sub(hn::LoadU(d, p + stride), hn::LoadU(d, p - stride)));
+      const auto gy = keep(hn::Sub(below, above));
+      above = here;
+      here = below;
       xx = hn::MulAdd(gx, gx, xx);
       xy = hn::MulAdd(gx, gy, xy);
       yy = hn::MulAdd(gy, gy, yy);
