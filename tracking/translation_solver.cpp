@@ -129,7 +129,7 @@ int SolveTranslation(const float* t, const window_shape& shape, const translatio
     double step[packed_cholesky::kMaxRows];
     image.WithSamples([&](const auto* samples) {
       kernels::TranslationResidual(t, samples, image.width, image.height, place, shape, color,
-                                   mode == color_mode::joint, step);
+                                   step);
     });
     const double bx = 0.5 * step[0];
     const double by = 0.5 * step[1];

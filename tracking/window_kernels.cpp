@@ -48,13 +48,17 @@ HWY_INLINE void WithChannels(std::size_t channels, Run run) {
   }
 }
 
-// Calls run(0) to run(count - 1) with constants.
+// Calls run(0) to run(count - 1), with constants unless one-lane vectors make it many.
 template <std::size_t kCount, class Run>
 HWY_INLINE void Unrolled(Run run) {
-  [&]<std::size_t... k>(std::index_sequence<k...>) WINDOW_LAMBDA {
-    (run(std::integral_constant<std::size_t, k>()), ...);
+  if constexpr (kCount <= kWindowLanes) {
+    [&]<std::size_t... k>(std::index_sequence<k...>) WINDOW_LAMBDA {
+      (run(std::integral_constant<std::size_t, k>()), ...);
+    }
+    (std::make_index_sequence<kCount>());
+  } else {
+    for (std::size_t k = 0; k < kCount; ++k) run(k);
   }
-  (std::make_index_sequence<kCount>());
 }
 
 // A value for each of 16 C neighbouring samples of a row, after which vectors of every width start
@@ -281,12 +285,44 @@ struct ResidualSums {
   PerSample<C> gain, bias;      // of the fit
 };
 
-// Adds what the residuals of one vector in each row tell. sample() gives the image's, from the
-// first row on.
-template <std::size_t C, bool kAffine, bool kColor, bool kPerChannel, class D, class Sample,
-          class Keep>
-HWY_INLINE void AddResiduals(D d, std::size_t i, const float* t, window_shape shape, Sample sample,
-                             Keep keep, ResidualSums<C>& sums) {
+// The window's samples of one vector in each row, one row after the other: of an image at a shift,
+// or sampled before.
+template <std::size_t C, class D, class T>
+struct TranslatedRows {
+  TranslatedRows(D d, const T* first, std::size_t image_stride, float fx, float fy)
+      : in(first),
+        stride(image_stride),
+        wx(hn::Set(d, fx)),
+        wy(hn::Set(d, fy)),
+        above(SlopeAt(d, first, C).At(wx)) {}
+  HWY_INLINE hn::Vec<D> Next(D d) {
+    in += stride;
+    const auto below = SlopeAt(d, in, C).At(wx);
+    const auto sample = Lerp(above, below, wy);
+    above = below;
+    return sample;
+  }
+
+  const T* in;
+  std::size_t stride;
+  hn::Vec<D> wx, wy, above;
+};
+template <class D>
+struct SampledRows {
+  HWY_INLINE hn::Vec<D> Next(D d) {
+    const auto sample = hn::LoadU(d, in);
+    in += stride;
+    return sample;
+  }
+
+  const float* in;
+  std::size_t stride;
+};
+
+// Adds what the residuals of one vector in each row tell.
+template <std::size_t C, bool kAffine, bool kColor, class D, class Rows, class Keep>
+HWY_NOINLINE void AddResiduals(D d, std::size_t i, const float* t, window_shape shape, Rows rows,
+                               Keep keep, ResidualSums<C>& sums) {
   const std::size_t stride = shape.stride();
   auto gain = hn::Zero(d), bias = hn::Zero(d);
   if constexpr (kColor) {
@@ -301,7 +337,7 @@ HWY_INLINE void AddResiduals(D d, std::size_t i, const float* t, window_shape sh
   auto t_here = hn::LoadU(d, t);
   auto v = hn::Set(d, -static_cast<float>(shape.half_y));
   for (std::size_t row = 0; row < shape.rows(); ++row, t += stride) {
-    auto present = sample();
+    auto present = rows.Next(d);
     if constexpr (kColor) present = hn::MulAdd(gain, present, bias);
     const auto r = keep(hn::Sub(t_here, present));
     const auto t_below = hn::LoadU(d, t + stride);
@@ -319,7 +355,7 @@ HWY_INLINE void AddResiduals(D d, std::size_t i, const float* t, window_shape sh
       x = hn::MulAdd(gx, r, x);
       y = hn::MulAdd(gy, r, y);
     }
-    if constexpr (kPerChannel) {
+    if constexpr (kColor) {
       tr = hn::MulAdd(t_here, r, tr);
       ones = hn::Add(ones, r);
     }
@@ -335,13 +371,13 @@ HWY_INLINE void AddResiduals(D d, std::size_t i, const float* t, window_shape sh
     sums.motion[4].Add(d, i, hn::Mul(u, y));
     sums.motion[5].Add(d, i, vy);
   }
-  if constexpr (kPerChannel) {
+  if constexpr (kColor) {
     sums.tr.Add(d, i, tr);
     sums.ones.Add(d, i, ones);
   }
 }
 
-template <std::size_t C, bool kColor, bool kPerChannel, class T>
+template <std::size_t C, bool kColor, class T>
 HWY_INLINE void TranslationSums(const float* t, const T* image, std::size_t image_width,
                                 std::size_t image_height, translated_sampling place,
                                 window_shape shape, const color_fit& color, double* totals) {
@@ -353,18 +389,9 @@ HWY_INLINE void TranslationSums(const float* t, const T* image, std::size_t imag
     sums.bias.SpreadChannels(color.bias);
   }
   const auto add = [&](auto d, std::size_t i, auto keep) WINDOW_LAMBDA {
-    const auto wx = hn::Set(d, place.fx);
-    const auto wy = hn::Set(d, place.fy);
-    const T* in = image + first + i;
-    auto above = SlopeAt(d, in, C).At(wx);
-    const auto sample = [&]() WINDOW_LAMBDA {
-      in += in_stride;
-      const auto below = SlopeAt(d, in, C).At(wx);
-      const auto present = Lerp(above, below, wy);
-      above = below;
-      return present;
-    };
-    AddResiduals<C, false, kColor, kPerChannel>(d, i, t, shape, sample, keep, sums);
+    const TranslatedRows<C, decltype(d), T> rows(d, image + first + i, in_stride, place.fx,
+                                                 place.fy);
+    AddResiduals<C, false, kColor>(d, i, t, shape, rows, keep, sums);
   };
   // Whole vectors read on behind the window's last pixel, which may lie behind the image.
   const bool wide =
@@ -378,7 +405,7 @@ HWY_INLINE void TranslationSums(const float* t, const T* image, std::size_t imag
     add(hn::CappedTag<float, 1>(), i, [](auto v) WINDOW_LAMBDA { return v; });
   }
   for (std::size_t m = 0; m < 2; ++m) totals[m] = sums.motion[m].Total();
-  if constexpr (kPerChannel) {
+  if constexpr (kColor) {
     sums.tr.TotalsByChannel(totals + 2, 2);
     sums.ones.TotalsByChannel(totals + 3, 2);
   }
@@ -387,35 +414,27 @@ HWY_INLINE void TranslationSums(const float* t, const T* image, std::size_t imag
 template <class T>
 HWY_INLINE void TranslationResidual(const float* t, const T* image, std::size_t image_width,
                                     std::size_t image_height, translated_sampling place,
-                                    window_shape shape, const color_fit& color, bool per_channel,
-                                    double* sums) {
+                                    window_shape shape, const color_fit& color, double* sums) {
   WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
-    if (per_channel) {
-      TranslationSums<C, true, true>(t, image, image_width, image_height, place, shape, color,
-                                     sums);
-    } else if (color.gain != nullptr) {
-      TranslationSums<C, true, false>(t, image, image_width, image_height, place, shape, color,
-                                      sums);
+    if (color.gain != nullptr) {
+      TranslationSums<C, true>(t, image, image_width, image_height, place, shape, color, sums);
     } else {
-      TranslationSums<C, false, false>(t, image, image_width, image_height, place, shape, color,
-                                       sums);
+      TranslationSums<C, false>(t, image, image_width, image_height, place, shape, color, sums);
     }
   });
 }
 
 void TranslationResidualFloats(const float* t, const float* image, std::size_t image_width,
                                std::size_t image_height, const translated_sampling& place,
-                               const window_shape& shape, const color_fit& color, bool per_channel,
-                               double* sums) {
-  TranslationResidual(t, image, image_width, image_height, place, shape, color, per_channel, sums);
+                               const window_shape& shape, const color_fit& color, double* sums) {
+  TranslationResidual(t, image, image_width, image_height, place, shape, color, sums);
 }
 
 void TranslationResidualBytes(const float* t, const std::uint8_t* image, std::size_t image_width,
                               std::size_t image_height, const translated_sampling& place,
-                              const window_shape& shape, const color_fit& color, bool per_channel,
-                              double* sums) {
-  TranslationResidual(t, image, image_width, image_height, place, shape, color, per_channel, sums);
+                              const window_shape& shape, const color_fit& color, double* sums) {
+  TranslationResidual(t, image, image_width, image_height, place, shape, color, sums);
 }
 
 // One pixel: its channels from the four around it.
@@ -457,8 +476,8 @@ HWY_INLINE void SampleAffinePixels(const T* origin, std::size_t stride, std::siz
 // side of a row's pixels is mostly the upper side of the next row's. kWide is for warps of which
 // ReadsWide is true.
 template <std::size_t C, bool kWide, class T>
-HWY_INLINE void SampleAffineStrip(const T* image, std::size_t image_width, affine_sampling warp,
-                                  window_shape shape, std::size_t column, float* out) {
+HWY_NOINLINE void SampleAffineStrip(const T* image, std::size_t image_width, affine_sampling warp,
+                                    window_shape shape, std::size_t column, float* out) {
   const Lanes d;
   const hn::RebindToSigned<Lanes> di;
   constexpr std::size_t N = kLanes;
@@ -618,13 +637,8 @@ HWY_INLINE void AffineSums(const float* t, const float* window, window_shape sha
     sums.bias.SpreadChannels(color.bias);
   }
   ForEachColumn(shape, [&](std::size_t i, auto keep) WINDOW_LAMBDA {
-    const float* in = window + i;
-    const auto sample = [&]() WINDOW_LAMBDA {
-      const auto present = hn::LoadU(d, in);
-      in += shape.stride();
-      return present;
-    };
-    AddResiduals<C, true, kColor, kColor>(d, i, t, shape, sample, keep, sums);
+    AddResiduals<C, true, kColor>(d, i, t, shape, SampledRows<Lanes>{window + i, shape.stride()},
+                                  keep, sums);
   });
   for (std::size_t m = 0; m < 6; ++m) totals[m] = sums.motion[m].Total();
   if constexpr (kColor) {
@@ -867,18 +881,16 @@ void SampleAffine(const std::uint8_t* image, std::size_t image_width, std::size_
 
 void TranslationResidual(const float* t, const float* image, std::size_t image_width,
                          std::size_t image_height, const translated_sampling& place,
-                         const window_shape& shape, const color_fit& color, bool per_channel,
-                         double* sums) {
+                         const window_shape& shape, const color_fit& color, double* sums) {
   HWY_DYNAMIC_DISPATCH(TranslationResidualFloats)
-  (t, image, image_width, image_height, place, shape, color, per_channel, sums);
+  (t, image, image_width, image_height, place, shape, color, sums);
 }
 
 void TranslationResidual(const float* t, const std::uint8_t* image, std::size_t image_width,
                          std::size_t image_height, const translated_sampling& place,
-                         const window_shape& shape, const color_fit& color, bool per_channel,
-                         double* sums) {
+                         const window_shape& shape, const color_fit& color, double* sums) {
   HWY_DYNAMIC_DISPATCH(TranslationResidualBytes)
-  (t, image, image_width, image_height, place, shape, color, per_channel, sums);
+  (t, image, image_width, image_height, place, shape, color, sums);
 }
 
 void AffineResidual(const float* t, const float* window, const window_shape& shape,

@@ -271,7 +271,7 @@ constexpr float kGain[] = {0.8f, 1.3f, 1.0f, 2.0f}, kBias[] = {5.0f, -9.0f, 0.0f
 // `sampled` gives the image's value at a sample of the window.
 template <class Sampled>
 void ExpectResiduals(const double* sums, const std::vector<Sample>& samples, bool affine,
-                     bool color, bool per_channel, Sampled sampled) {
+                     bool color, Sampled sampled) {
   const auto r = [&](const Sample& s) {
     return s.value - (color ? kGain[s.c] * sampled(s) + kBias[s.c] : sampled(s));
   };
@@ -283,7 +283,7 @@ void ExpectResiduals(const double* sums, const std::vector<Sample>& samples, boo
     ExpectSum(*sums++, samples, -1, [&](const Sample& s) { return s.u * s.gy * r(s); });
     ExpectSum(*sums++, samples, -1, [&](const Sample& s) { return s.v * s.gy * r(s); });
   }
-  for (std::size_t c = 0; per_channel && c <= samples.back().c; ++c) {
+  for (std::size_t c = 0; color && c <= samples.back().c; ++c) {
     ExpectSum(*sums++, samples, static_cast<int>(c),
               [&](const Sample& s) { return s.value * r(s); });
     ExpectSum(*sums++, samples, static_cast<int>(c), r);
@@ -305,14 +305,14 @@ TEST(WindowKernelsTest, ResidualsOfATranslationEqualPlainLoops) {
           return image.Bilinear(static_cast<double>(place.x + shape.half_x) + s.u + place.fx,
                                 static_cast<double>(place.y + shape.half_y) + s.v + place.fy, s.c);
         };
-        for (const int mode : {0, 1, 2}) {  // plain, with a fit, and sums by channel
-          const color_fit fit = mode > 0 ? color_fit{kGain, kBias} : color_fit{};
+        for (const bool color : {false, true}) {
+          const color_fit fit = color ? color_fit{kGain, kBias} : color_fit{};
           double sums[10] = {}, of_bytes[10] = {};
           kernels::TranslationResidual(t.data(), image.data.data(), image.width, image.height,
-                                       place, shape, fit, mode == 2, sums);
-          ExpectResiduals(sums, samples, false, mode > 0, mode == 2, sampled);
+                                       place, shape, fit, sums);
+          ExpectResiduals(sums, samples, false, color, sampled);
           kernels::TranslationResidual(t.data(), bytes.data(), image.width, image.height, place,
-                                       shape, fit, mode == 2, of_bytes);
+                                       shape, fit, of_bytes);
           for (int k = 0; k < 10; ++k) ASSERT_EQ(of_bytes[k], sums[k]);
         }
       }
@@ -330,7 +330,7 @@ TEST(WindowKernelsTest, ResidualsOfAWindowEqualPlainLoops) {
         double sums[6 + 8];
         kernels::AffineResidual(t.data(), window.data(), shape,
                                 color ? color_fit{kGain, kBias} : color_fit{}, sums);
-        ExpectResiduals(sums, Samples(shape, t.data()), true, color, color, sampled);
+        ExpectResiduals(sums, Samples(shape, t.data()), true, color, sampled);
       }
     });
   });
@@ -355,7 +355,7 @@ TEST(WindowKernelsTest, VectorsOfEveryWidthAddUpToTheSameBits) {
     std::vector<double> sums(12 + 8);
     kernels::AffineResidual(t.data(), window, shape, {kGain, kBias}, sums.data());
     kernels::TranslationResidual(t.data(), image.data.data(), 90, 80, {40, 30, 0.3f, 0.7f}, shape,
-                                 {kGain, kBias}, true, sums.data() + 12);
+                                 {kGain, kBias}, sums.data() + 12);
     template_products products;
     kernels::TemplateProducts(t.data(), shape, products);
     for (const auto& row : products.gradient) sums.insert(sums.end(), row, row + 6);
