@@ -33,10 +33,10 @@ bool SampleWarped(const level_image& image, const window_shape& shape, const Aff
 
 }  // namespace
 
-bool PrepareAffine(const template_planes& level, const offset_planes& offsets,
-                   const window_shape& shape, bool with_color, packed_cholesky& normal) {
+bool PrepareAffine(const float* t, const window_shape& shape, bool with_color,
+                   packed_cholesky& normal) {
   template_products products;
-  kernels::TemplateProducts(level, offsets, shape, products);
+  kernels::TemplateProducts(t, shape, products);
   const std::size_t rows = 6 + (with_color ? 2 * shape.channels : 0);
   double h[packed_cholesky::kMaxRows * packed_cholesky::kMaxRows] = {};
   // Motion column m is gradient axis[m] times factor[m] of (1, u, v); the product of two factors
@@ -80,10 +80,9 @@ void ComposeAffine(const double* step, AffineState& state) {
   state.d = static_cast<float>(p11 - 1.0);
 }
 
-int SolveAffine(const template_planes& level, const offset_planes& offsets,
-                const window_shape& shape, const packed_cholesky& normal, const level_image& image,
-                color_mode mode, const solver_tolerances& tolerances, int max_iterations,
-                AffineState& state, float* window) {
+int SolveAffine(const float* t, const window_shape& shape, const packed_cholesky& normal,
+                const level_image& image, color_mode mode, const solver_tolerances& tolerances,
+                int max_iterations, AffineState& state, float* window) {
   if (mode != color_mode::none && mode != color_mode::joint) return kLevelFailed;
   const bool with_color = mode == color_mode::joint;
   for (int k = 0; k < max_iterations; ++k) {
@@ -91,7 +90,7 @@ int SolveAffine(const template_planes& level, const offset_planes& offsets,
     color_fit color;
     if (with_color) color = {state.gain, state.bias};
     double step[packed_cholesky::kMaxRows];
-    kernels::AffineResidual(level, offsets, window, shape, color, step);
+    kernels::AffineResidual(t, window, shape, color, step);
     for (std::size_t m = 0; m < 6; ++m) step[m] *= 0.5;
     normal.Solve(step);
     ComposeAffine(step, state);

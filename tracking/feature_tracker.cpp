@@ -24,35 +24,32 @@ struct FeatureTracker::translation_stage {
   float x, y;
   color_mode mode;
   std::size_t levels_sampled = 0;
-  bool prepared = false;
-  std::size_t prepared_level = 0;
-  bool singular = false;
+  std::size_t levels_prepared = 0;
 
   void SampleTo(std::size_t level) {
     for (; levels_sampled <= level; ++levels_sampled) {
-      ExtractWindowLevel(levels_sampled, x, y, previous, tracker.translation_stack_,
-                         tracker.scratch_.data());
+      ExtractWindowLevel(levels_sampled, x, y, previous, tracker.translation_stack_);
     }
   }
 
   int Solve(std::size_t level, AffineState& state) {
     SampleTo(level);
-    const template_planes planes = tracker.translation_stack_.Level(level);
-    if (!prepared || prepared_level != level) {
-      prepared = true;
-      prepared_level = level;
-      singular = !PrepareTranslation(planes, tracker.offsets(), tracker.shape_, mode,
-                                     tracker.translation_normal_);
+    const float* t = tracker.translation_stack_.Level(level);
+    for (; levels_prepared <= level; ++levels_prepared) {
+      translation_level& next = tracker.translation_levels_[levels_prepared];
+      next.singular = !PrepareTranslation(tracker.translation_stack_.Level(levels_prepared),
+                                          tracker.shape_, mode, next.normal);
     }
-    if (singular) return kLevelFailed;
-    return SolveTranslation(planes, tracker.shape_, tracker.translation_normal_,
-                            current.Level(level), mode, tracker.tolerances_,
-                            tracker.max_iterations_, state, tracker.window_.data());
+    const translation_level& prepared = tracker.translation_levels_[level];
+    if (prepared.singular) return kLevelFailed;
+    return SolveTranslation(t, tracker.shape_, prepared.normal, current.Level(level), mode,
+                            tracker.tolerances_, tracker.max_iterations_, state,
+                            tracker.sample_.Level(0));
   }
 
   float Correlation(std::size_t level) {
-    return NormalisedCorrelation(tracker.shape_, tracker.translation_stack_.Level(level).t,
-                                 tracker.window_.data());
+    return NormalisedCorrelation(tracker.shape_, tracker.translation_stack_.Level(level),
+                                 tracker.sample_.Level(0));
   }
 };
 
@@ -65,27 +62,27 @@ struct FeatureTracker::affine_stage {
   int Solve(std::size_t level, AffineState& state) {
     if (mode != color_mode::none && mode != color_mode::joint) return kLevelFailed;
     affine_level& cached = slot.levels[level];
-    const template_planes planes = slot.stack.Level(level);
+    const float* t = slot.stack.Level(level);
     if (cached.normal_state == readiness::unknown) {
-      cached.normal_state = PrepareAffine(planes, tracker.offsets(), tracker.shape_,
-                                          mode == color_mode::joint, cached.normal)
-                                ? readiness::ready
-                                : readiness::singular;
+      cached.normal_state =
+          PrepareAffine(t, tracker.shape_, mode == color_mode::joint, cached.normal)
+              ? readiness::ready
+              : readiness::singular;
     }
     if (cached.normal_state == readiness::singular) return kLevelFailed;
-    return SolveAffine(planes, tracker.offsets(), tracker.shape_, cached.normal,
-                       current.Level(level), mode, tracker.tolerances_, tracker.max_iterations_,
-                       state, tracker.window_.data());
+    return SolveAffine(t, tracker.shape_, cached.normal, current.Level(level), mode,
+                       tracker.tolerances_, tracker.max_iterations_, state,
+                       tracker.sample_.Level(0));
   }
 
   float Correlation(std::size_t level) {
     affine_level& cached = slot.levels[level];
-    const float* t = slot.stack.Level(level).t;
+    const float* t = slot.stack.Level(level);
     if (!cached.has_moments) {
       cached.moments = ChannelMoments(t, tracker.shape_);
       cached.has_moments = true;
     }
-    return NormalisedCorrelation(tracker.shape_, t, cached.moments, tracker.window_.data());
+    return NormalisedCorrelation(tracker.shape_, t, cached.moments, tracker.sample_.Level(0));
   }
 };
 
@@ -104,16 +101,9 @@ FeatureTracker::FeatureTracker(const TrackerParams& params, std::size_t feature_
                   static_cast<float>(params.tolerance_color_lambda),
                   static_cast<float>(params.tolerance_color_delta)},
       shape_{params.half_win_x, params.half_win_x, channels},
-      offset_u_(shape_.plane_size()),
-      offset_v_(shape_.plane_size()),
-      scratch_(WindowScratchSize(shape_)),
-      window_(shape_.plane_size()),
-      translation_stack_(shape_.half_x, shape_.half_y, channels, levels_) {
-  for (std::size_t i = 0; i < shape_.samples(); ++i) {
-    const std::size_t pixel = i / channels;
-    offset_u_[i] = static_cast<float>(pixel % shape_.columns()) - static_cast<float>(shape_.half_x);
-    offset_v_[i] = static_cast<float>(pixel / shape_.columns()) - static_cast<float>(shape_.half_y);
-  }
+      sample_(shape_.half_x, shape_.half_y, channels, 1),
+      translation_stack_(shape_.half_x, shape_.half_y, channels, levels_),
+      translation_levels_(levels_) {
   if (!verification_) return;
   slots_.resize(feature_count);
   for (feature_slot& slot : slots_) {
@@ -163,7 +153,7 @@ bool FeatureTracker::TrackFeature(const ImagePyramid& previous, const ImagePyram
   translation_stage stage{*this, previous, current, from.x, from.y, translation_mode_};
   stage.SampleTo(0);
   float limit = min_correlation_;
-  if (FindPrimaryChannel(stack.Level(0).t, shape_, dark_threshold_) != 0) {
+  if (FindPrimaryChannel(stack.Level(0), shape_, dark_threshold_) != 0) {
     stage.mode = color_mode::none;
     limit = kAnyCorrelation;
   }
@@ -182,14 +172,14 @@ void FeatureTracker::InitialiseSeeds(const ImagePyramid& current,
   for (std::size_t s = 0; s < slots_.size(); ++s) {
     if (row[s].status <= 0) continue;
     feature_slot& slot = slots_[s];
-    ExtractWindowStack(levels_, row[s].x, row[s].y, current, slot.stack, scratch_.data());
+    ExtractWindowStack(levels_, row[s].x, row[s].y, current, slot.stack);
     for (affine_level& level : slot.levels) {
       level.normal_state = readiness::unknown;
       level.has_moments = false;
     }
     slot.primary_channel = slot.stack.levels_built == 0
                                ? 0
-                               : FindPrimaryChannel(slot.stack.Level(0).t, shape_, dark_threshold_);
+                               : FindPrimaryChannel(slot.stack.Level(0), shape_, dark_threshold_);
     slot.state = AffineState(row[s].x, row[s].y);
   }
 }

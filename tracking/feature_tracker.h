@@ -53,6 +53,10 @@ class FeatureTracker {
  private:
   // What depends on one level of a template alone, computed when it is first needed.
   enum class readiness : unsigned char { unknown, ready, singular };
+  struct translation_level {
+    bool singular = false;
+    translation_normal normal;
+  };
   struct affine_level {
     readiness normal_state = readiness::unknown;
     bool has_moments = false;
@@ -78,7 +82,6 @@ class FeatureTracker {
                     TrackingStatistics& statistics);
   bool VerifyFeature(const ImagePyramid& current, feature_slot& slot, float limit,
                      tracking_feature<float>& cell, TrackingStatistics& statistics);
-  offset_planes offsets() const { return {offset_u_.data(), offset_v_.data()}; }
 
   std::size_t levels_;
   int max_iterations_;
@@ -89,13 +92,10 @@ class FeatureTracker {
   float dark_threshold_;
   solver_tolerances tolerances_;
   window_shape shape_;
-  std::vector<float> offset_u_;
-  std::vector<float> offset_v_;
-  std::vector<float> scratch_;
-  std::vector<float> window_;  // the last sample
+  WindowStack sample_;  // of one level: the last sample
   WindowStack translation_stack_;
-  translation_normal translation_normal_;  // of the level that was last prepared
-  std::vector<feature_slot> slots_;        // empty without verification
+  std::vector<translation_level> translation_levels_;
+  std::vector<feature_slot> slots_;  // empty without verification
 };
 
 }  // namespace marrow::tracking

@@ -7,8 +7,8 @@
 namespace marrow::tracking {
 namespace {
 
-bool SampleAt(const level_image& image, const window_shape& shape, const AffineState& state,
-              float* window) {
+bool FindPlace(const level_image& image, const window_shape& shape, const AffineState& state,
+               translated_sampling& place) {
   if (image.width < 2 * shape.half_x + 2 || image.height < 2 * shape.half_y + 3) return false;
   const double x = static_cast<double>(state.x) + static_cast<double>(state.dx);
   const double y = static_cast<double>(state.y) + static_cast<double>(state.dy);
@@ -21,13 +21,17 @@ bool SampleAt(const level_image& image, const window_shape& shape, const AffineS
         iy <= static_cast<double>(image.height) - half_y - 3.0)) {
     return false;
   }
-  image.WithSamples([&](const auto* samples) {
-    kernels::SampleTranslated(
-        samples, image.width, shape.channels, static_cast<std::size_t>(ix) - shape.half_x,
-        static_cast<std::size_t>(iy) - shape.half_y, static_cast<float>(x - ix),
-        static_cast<float>(y - iy), shape.columns(), shape.rows(), window);
-  });
+  place = {static_cast<std::size_t>(ix) - shape.half_x, static_cast<std::size_t>(iy) - shape.half_y,
+           static_cast<float>(x - ix), static_cast<float>(y - iy)};
   return true;
+}
+
+void Sample(const level_image& image, const window_shape& shape, const translated_sampling& place,
+            float* window) {
+  image.WithSamples([&](const auto* samples) {
+    kernels::SampleTranslated(samples, image.width, shape.channels, place, shape.columns(),
+                              shape.rows(), window, shape.stride());
+  });
 }
 
 // T = gain I + bias by least squares, for each channel. A flat window gives no finite answer.
@@ -63,11 +67,11 @@ bool UpdateColors(const double* steps, std::size_t channels, const solver_tolera
   return small;
 }
 
-bool PrepareTranslation(const template_planes& level, const offset_planes& offsets,
-                        const window_shape& shape, color_mode mode, translation_normal& normal) {
+bool PrepareTranslation(const float* t, const window_shape& shape, color_mode mode,
+                        translation_normal& normal) {
   if (mode != color_mode::joint) {
     double sums[3];
-    kernels::GradientProducts(level, shape, sums);
+    kernels::GradientProducts(t, shape, sums);
     const double xx = 0.25 * sums[0];
     const double xy = 0.25 * sums[1];
     const double yy = 0.25 * sums[2];
@@ -78,7 +82,7 @@ bool PrepareTranslation(const template_planes& level, const offset_planes& offse
     return true;
   }
   template_products products;
-  kernels::TemplateProducts(level, offsets, shape, products);
+  kernels::TemplateProducts(t, shape, products);
   const std::size_t rows = 2 + 2 * shape.channels;
   double h[packed_cholesky::kMaxRows * packed_cholesky::kMaxRows] = {};
   h[0] = 0.25 * products.gradient[0][0];
@@ -98,10 +102,9 @@ bool PrepareTranslation(const template_planes& level, const offset_planes& offse
   return normal.joint.Factor(h, rows);
 }
 
-int SolveTranslation(const template_planes& level, const window_shape& shape,
-                     const translation_normal& normal, const level_image& image, color_mode mode,
-                     const solver_tolerances& tolerances, int max_iterations, AffineState& state,
-                     float* window) {
+int SolveTranslation(const float* t, const window_shape& shape, const translation_normal& normal,
+                     const level_image& image, color_mode mode, const solver_tolerances& tolerances,
+                     int max_iterations, AffineState& state, float* window) {
   switch (mode) {
     case color_mode::none:
     case color_mode::joint:
@@ -113,14 +116,21 @@ int SolveTranslation(const template_planes& level, const window_shape& shape,
       return kLevelFailed;
   }
   channel_moments moments;
-  if (mode == color_mode::regressed) moments = ChannelMoments(level.t, shape);
+  if (mode == color_mode::regressed) moments = ChannelMoments(t, shape);
   for (int k = 0; k < max_iterations; ++k) {
-    if (!SampleAt(image, shape, state, window)) return kLevelFailed;
-    if (mode == color_mode::regressed) RegressColors(level.t, moments, window, shape, state);
+    translated_sampling place;
+    if (!FindPlace(image, shape, state, place)) return kLevelFailed;
+    if (mode == color_mode::regressed) {
+      Sample(image, shape, place, window);
+      RegressColors(t, moments, window, shape, state);
+    }
     color_fit color;
     if (mode != color_mode::none) color = {state.gain, state.bias};
     double step[packed_cholesky::kMaxRows];
-    kernels::TranslationResidual(level, window, shape, color, mode == color_mode::joint, step);
+    image.WithSamples([&](const auto* samples) {
+      kernels::TranslationResidual(t, samples, image.width, image.height, place, shape, color,
+                                   step);
+    });
     const double bx = 0.5 * step[0];
     const double by = 0.5 * step[1];
     if (mode == color_mode::joint) {
@@ -140,7 +150,10 @@ int SolveTranslation(const template_planes& level, const window_shape& shape,
     if (mode == color_mode::joint && !UpdateColors(step + 2, shape.channels, tolerances, state)) {
       converged = false;
     }
-    if (converged) return k;
+    if (converged || k + 1 == max_iterations) {
+      Sample(image, shape, place, window);
+      return converged ? k : max_iterations;
+    }
   }
   return max_iterations;
 }

@@ -16,17 +16,17 @@ struct translation_normal {
 
 // False if the joint matrix is not positive definite. A singular matrix of the other modes passes:
 // its steps are not finite, and the next bounds test stops them.
-bool PrepareTranslation(const template_planes& level, const offset_planes& offsets,
-                        const window_shape& shape, color_mode mode, translation_normal& normal);
+bool PrepareTranslation(const float* t, const window_shape& shape, color_mode mode,
+                        translation_normal& normal);
 
 // Inverse-compositional alignment of a template (Baker and Matthews, Lucas-Kanade 20 Years On,
 // 2004) by translation: iterates state.dx, dy (and gain, bias) until the steps are under the
-// tolerances. state.x, y: the template's position on this level. `window` receives the last sample.
-// Returns the iteration at which it converged, max_iterations, or kLevelFailed when the window
-// leaves the image or the mode is not one of color_mode.
-int SolveTranslation(const template_planes& level, const window_shape& shape,
-                     const translation_normal& normal, const level_image& image, color_mode mode,
-                     const solver_tolerances& tolerances, int max_iterations, AffineState& state,
-                     float* window);
+// tolerances. t: the template's plane. state.x, y: its position on this level. `window`, a plane,
+// receives the last sample, of the state before the last step, unless the level failed. Returns the
+// iteration at which it converged, max_iterations, or kLevelFailed when the window leaves the image
+// or the mode is not one of color_mode.
+int SolveTranslation(const float* t, const window_shape& shape, const translation_normal& normal,
+                     const level_image& image, color_mode mode, const solver_tolerances& tolerances,
+                     int max_iterations, AffineState& state, float* window);
 
 }  // namespace marrow::tracking

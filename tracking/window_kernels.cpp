@@ -1,7 +1,12 @@
 #include "tracking/window_kernels.h"
 
 #include <algorithm>
+#include <bit>
+#include <cmath>
 #include <cstdint>
+#include <limits>
+#include <type_traits>
+#include <utility>
 
 #undef HWY_TARGET_INCLUDE
 #define HWY_TARGET_INCLUDE "tracking/window_kernels.cpp"
@@ -9,13 +14,19 @@
 // After foreach_target.
 #include <hwy/highway.h>
 
+// Of a lambda in a kernel: it has to be part of the loop around it.
+#ifndef WINDOW_LAMBDA
+#define WINDOW_LAMBDA HWY_ATTR __attribute__((always_inline))
+#endif
+
 HWY_BEFORE_NAMESPACE();
 namespace marrow::tracking::HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
-// 16 lanes at most: planes are padded for that.
-using Lanes = hn::CappedTag<float, 16>;
+// 16 lanes at most: rows have room for that.
+using Lanes = hn::CappedTag<float, kWindowLanes>;
 using Vector = hn::Vec<Lanes>;
+constexpr std::size_t kLanes = hn::MaxLanes(Lanes());
 
 template <class V>
 HWY_INLINE V Lerp(V from, V to, V fraction) {
@@ -37,68 +48,157 @@ HWY_INLINE void WithChannels(std::size_t channels, Run run) {
   }
 }
 
-HWY_INLINE double Total(Vector sums) {
-  const Lanes d;
-  HWY_ALIGN float lanes[16];
-  hn::Store(sums, d, lanes);
-  double total = 0.0;
-  for (std::size_t j = 0; j < hn::Lanes(d); ++j) total += static_cast<double>(lanes[j]);
-  return total;
+// Calls run(0) to run(count - 1), with constants unless one-lane vectors make it many.
+template <std::size_t kCount, class Run>
+HWY_INLINE void Unrolled(Run run) {
+  if constexpr (kCount <= kWindowLanes) {
+    [&]<std::size_t... k>(std::index_sequence<k...>) WINDOW_LAMBDA {
+      (run(std::integral_constant<std::size_t, k>()), ...);
+    }
+    (std::make_index_sequence<kCount>());
+  } else {
+    for (std::size_t k = 0; k < kCount; ++k) run(k);
+  }
 }
 
-// Interleaved samples are read in blocks of C vectors, so that lane j of the block's vector k holds
-// channel (k * N + j) % C in every block: per-channel sums are C vectors, told apart at the end.
+// A value for each of 16 C neighbouring samples of a row, after which vectors of every width start
+// with the first channel again. Sums kept so have the same terms in the same order whatever the
+// width; they are joined in double.
 template <std::size_t C>
-HWY_INLINE void AddByChannel(const Vector (&sums)[C], double* totals, std::size_t stride) {
-  const Lanes d;
-  const std::size_t N = hn::Lanes(d);
-  HWY_ALIGN float lanes[16];
-  for (std::size_t k = 0; k < C; ++k) {
-    hn::Store(sums[k], d, lanes);
-    for (std::size_t j = 0; j < N; ++j) {
-      totals[(k * N + j) % C * stride] += static_cast<double>(lanes[j]);
+struct PerSample {
+  static constexpr std::size_t kSize = kWindowLanes * C;
+
+  // Of the vector whose first sample is the row's i-th.
+  template <class D>
+  HWY_INLINE hn::Vec<D> At(D d, std::size_t i) const {
+    return hn::LoadU(d, values + i % kSize);
+  }
+  template <class D>
+  HWY_INLINE void Set(D d, std::size_t i, hn::Vec<D> value) {
+    hn::StoreU(value, d, values + i % kSize);
+  }
+  template <class D>
+  HWY_INLINE void Add(D d, std::size_t i, hn::Vec<D> value) {
+    Set(d, i, hn::Add(At(d, i), value));
+  }
+
+  HWY_INLINE void SpreadChannels(const float* channels) {
+    for (std::size_t pixel = 0; pixel < kWindowLanes; ++pixel) {
+      for (std::size_t c = 0; c < C; ++c) values[pixel * C + c] = channels[c];
     }
   }
-}
-
-template <std::size_t C>
-HWY_INLINE void SpreadChannels(const float* values, Vector (&spread)[C]) {
-  const Lanes d;
-  const std::size_t N = hn::Lanes(d);
-  HWY_ALIGN float lanes[16];
-  for (std::size_t k = 0; k < C; ++k) {
-    for (std::size_t j = 0; j < N; ++j) lanes[j] = values[(k * N + j) % C];
-    spread[k] = hn::Load(d, lanes);
+  HWY_INLINE void TotalsByChannel(double* totals, std::size_t stride) const {
+    double part[4 * C] = {};
+    for (std::size_t j = 0; j < kSize; j += 4 * C) {
+      for (std::size_t m = 0; m < 4 * C; ++m) part[m] += static_cast<double>(values[j + m]);
+    }
+    for (std::size_t c = 0; c < C; ++c) {
+      totals[c * stride] = (part[c] + part[c + C]) + (part[c + 2 * C] + part[c + 3 * C]);
+    }
   }
-}
+  HWY_INLINE double Total() const {
+    static_assert(C == 1);
+    double total;
+    TotalsByChannel(&total, 1);
+    return total;
+  }
 
-// Calls step(i, k, keep) for every vector: i its first sample, k its place in the block. `keep`
-// zeroes the lanes of a vector that lie behind the window's last sample.
-template <std::size_t C, class Step>
-HWY_INLINE void ForEachVector(std::size_t samples, Step step) {
+  HWY_ALIGN float values[kSize];
+};
+
+// Calls walk(i, keep) for each vector of a row, whose first sample is the row's i-th. `keep` zeroes
+// the lanes behind the row's last sample.
+template <class Walk>
+HWY_INLINE void ForEachColumn(window_shape shape, Walk walk) {
   const Lanes d;
   const std::size_t N = hn::Lanes(d);
-  const auto whole = [](Vector v) HWY_ATTR { return v; };
+  const std::size_t end = shape.row_samples();
   std::size_t i = 0;
-  for (; i + C * N <= samples; i += C * N) {
-    for (std::size_t k = 0; k < C; ++k) step(i + k * N, k, whole);
+  for (; i + N <= end; i += N) walk(i, [](Vector v) WINDOW_LAMBDA { return v; });
+  if (i < end) {
+    const auto inside = hn::FirstN(d, end - i);
+    walk(i, [inside](Vector v) WINDOW_LAMBDA { return hn::IfThenElseZero(inside, v); });
   }
-  for (std::size_t k = 0; k < C && i < samples; ++k, i += N) {
-    const auto inside = hn::FirstN(d, samples - i);
-    step(i, k, [inside](Vector v) HWY_ATTR { return hn::IfThenElseZero(inside, v); });
+}
+
+// PerSample's sums in vectors.
+template <std::size_t C>
+struct RowSums {
+  RowSums() {
+    for (Vector& s : sum) s = hn::Zero(Lanes());
+  }
+  HWY_INLINE void ByChannel(double* totals) const {
+    PerSample<C> sums;
+    for (std::size_t k = 0; k < kVectors; ++k) sums.Set(Lanes(), k * kLanes, sum[k]);
+    sums.TotalsByChannel(totals, 1);
+  }
+
+  static constexpr std::size_t kVectors = PerSample<C>::kSize / kLanes;
+  Vector sum[kVectors];
+};
+
+// Calls step(at, k, keep) for each vector of each row: `at` its first sample's place in the plane,
+// k its place in RowSums. `keep` as above.
+template <std::size_t C, class Step>
+HWY_INLINE void ForEachVector(window_shape shape, Step step) {
+  const Lanes d;
+  constexpr std::size_t kBlock = PerSample<C>::kSize;
+  const std::size_t end = shape.row_samples();
+  const std::size_t stride = shape.stride();
+  std::size_t i = 0;
+  for (; i + kBlock <= end; i += kBlock) {
+    for (std::size_t row = 0; row < shape.rows(); ++row) {
+      Unrolled<RowSums<C>::kVectors>([&](auto k) WINDOW_LAMBDA {
+        step(row * stride + i + k * kLanes, k, [](Vector v) WINDOW_LAMBDA { return v; });
+      });
+    }
+  }
+  for (std::size_t row = 0; row < shape.rows() && i < end; ++row) {
+    Unrolled<RowSums<C>::kVectors>([&](auto k) WINDOW_LAMBDA {
+      const std::size_t first = i + k * kLanes;
+      if (first >= end) return;
+      const auto inside = hn::FirstN(d, end - first);
+      step(row * stride + first, k,
+           [inside](Vector v) WINDOW_LAMBDA { return hn::IfThenElseZero(inside, v); });
+    });
   }
 }
 
 template <class D>
-HWY_INLINE hn::Vec<D> LoadSamples(D d, const float* samples) {
+HWY_INLINE auto LoadRaw(D d, const float* samples) {
   return hn::LoadU(d, samples);
 }
 
 template <class D>
-HWY_INLINE hn::Vec<D> LoadSamples(D d, const std::uint8_t* samples) {
-  const hn::Rebind<std::uint8_t, D> bytes;
+HWY_INLINE auto LoadRaw(D, const std::uint8_t* samples) {
+  return hn::LoadU(hn::Rebind<std::uint8_t, D>(), samples);
+}
+
+// Samples and what leads from each to its right neighbour.
+template <class V>
+struct Slope {
+  HWY_INLINE V At(V fraction) const { return hn::MulAdd(fraction, step, from); }
+  V from, step;
+};
+
+template <class D>
+HWY_INLINE Slope<hn::Vec<D>> SlopeOf(D, hn::Vec<D> from, hn::Vec<D> to) {
+  return {from, hn::Sub(to, from)};
+}
+
+// The difference of bytes is as exact in whole numbers, where it costs less.
+template <class D>
+HWY_INLINE Slope<hn::Vec<D>> SlopeOf(D d, hn::Vec<hn::Rebind<std::uint8_t, D>> from,
+                                     hn::Vec<hn::Rebind<std::uint8_t, D>> to) {
   const hn::RebindToSigned<D> di;
-  return hn::ConvertTo(d, hn::PromoteTo(di, hn::LoadU(bytes, samples)));
+  const auto a = hn::PromoteTo(di, from);
+  const auto b = hn::PromoteTo(di, to);
+  return {hn::ConvertTo(d, a), hn::ConvertTo(d, hn::Sub(b, a))};
+}
+
+template <class D, class T>
+HWY_INLINE Slope<hn::Vec<D>> SlopeAt(D d, const T* in, std::size_t channels) {
+  return SlopeOf(d, LoadRaw(d, in), LoadRaw(d, in + channels));
 }
 
 template <class D, class T>
@@ -106,10 +206,10 @@ HWY_INLINE void SampleStrip(D d, const T* in, std::size_t in_stride, std::size_t
                             float fy, std::size_t rows, float* out, std::size_t out_stride) {
   const auto wx = hn::Set(d, fx);
   const auto wy = hn::Set(d, fy);
-  auto above = Lerp(LoadSamples(d, in), LoadSamples(d, in + channels), wx);
+  auto above = SlopeAt(d, in, channels).At(wx);
   for (std::size_t row = 0; row < rows; ++row) {
     in += in_stride;
-    const auto below = Lerp(LoadSamples(d, in), LoadSamples(d, in + channels), wx);
+    const auto below = SlopeAt(d, in, channels).At(wx);
     hn::StoreU(Lerp(above, below, wy), d, out);
     above = below;
     out += out_stride;
@@ -118,184 +218,352 @@ HWY_INLINE void SampleStrip(D d, const T* in, std::size_t in_stride, std::size_t
 
 template <class T>
 HWY_INLINE void SampleWindow(const T* image, std::size_t image_width, std::size_t channels,
-                             std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                             std::size_t rows, float* out) {
+                             translated_sampling place, std::size_t columns, std::size_t rows,
+                             float* out, std::size_t out_stride) {
   const Lanes d;
   const std::size_t N = hn::Lanes(d);
   const std::size_t in_stride = image_width * channels;
-  const std::size_t out_stride = columns * channels;
-  const T* in = image + y * in_stride + x * channels;
-  if (out_stride < N) {
-    for (std::size_t i = 0; i < out_stride; ++i) {
-      SampleStrip(hn::CappedTag<float, 1>(), in + i, in_stride, channels, fx, fy, rows, out + i,
-                  out_stride);
+  const std::size_t end = columns * channels;
+  const T* in = image + place.y * in_stride + place.x * channels;
+  if (end < N) {
+    for (std::size_t i = 0; i < end; ++i) {
+      SampleStrip(hn::CappedTag<float, 1>(), in + i, in_stride, channels, place.fx, place.fy, rows,
+                  out + i, out_stride);
     }
     return;
   }
   std::size_t i = 0;
-  for (; i + N <= out_stride; i += N) {
-    SampleStrip(d, in + i, in_stride, channels, fx, fy, rows, out + i, out_stride);
+  for (; i + N <= end; i += N) {
+    SampleStrip(d, in + i, in_stride, channels, place.fx, place.fy, rows, out + i, out_stride);
   }
-  if (i < out_stride) {  // the last strip overlaps the one before
-    i = out_stride - N;
-    SampleStrip(d, in + i, in_stride, channels, fx, fy, rows, out + i, out_stride);
+  if (i < end) {  // the last strip overlaps the one before
+    i = end - N;
+    SampleStrip(d, in + i, in_stride, channels, place.fx, place.fy, rows, out + i, out_stride);
   }
 }
 
 void SampleTranslatedFloats(const float* image, std::size_t image_width, std::size_t channels,
-                            std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                            std::size_t rows, float* out) {
-  SampleWindow(image, image_width, channels, x, y, fx, fy, columns, rows, out);
+                            const translated_sampling& place, std::size_t columns, std::size_t rows,
+                            float* out, std::size_t out_stride) {
+  SampleWindow(image, image_width, channels, place, columns, rows, out, out_stride);
 }
 
 void SampleTranslatedBytes(const std::uint8_t* image, std::size_t image_width, std::size_t channels,
-                           std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                           std::size_t rows, float* out) {
-  SampleWindow(image, image_width, channels, x, y, fx, fy, columns, rows, out);
+                           const translated_sampling& place, std::size_t columns, std::size_t rows,
+                           float* out, std::size_t out_stride) {
+  SampleWindow(image, image_width, channels, place, columns, rows, out, out_stride);
 }
 
+// The pixel that each of the first 16 C samples of a row belongs to.
+template <std::size_t C>
+struct PixelOfSample {
+  constexpr PixelOfSample() : index() {
+    for (std::size_t i = 0; i < kWindowLanes * C; ++i) {
+      index[i] = static_cast<std::int32_t>(i / C);
+    }
+  }
+  HWY_ALIGN std::int32_t index[kWindowLanes * C];
+};
+template <std::size_t C>
+inline constexpr PixelOfSample<C> kPixelOfSample;
+
+// u of the vector whose first sample is the row's i-th.
+template <std::size_t C, class D>
+HWY_INLINE hn::Vec<D> OffsetsU(D d, std::size_t i, window_shape shape) {
+  constexpr std::size_t kBlock = kWindowLanes * C;
+  const hn::RebindToSigned<D> di;
+  const auto pixel = hn::LoadU(di, kPixelOfSample<C>.index + i % kBlock);
+  const auto first = static_cast<float>(i / kBlock * kWindowLanes);
+  return hn::Add(hn::ConvertTo(d, pixel), hn::Set(d, first - static_cast<float>(shape.half_x)));
+}
+
+template <std::size_t C>
+struct ResidualSums {
+  PerSample<1> motion[6] = {};  // of gx r, gy r, u gx r, v gx r, u gy r, v gy r
+  PerSample<C> tr = {};         // of T r
+  PerSample<C> ones = {};       // of r
+  PerSample<C> gain, bias;      // of the fit
+};
+
+// The window's samples of one vector in each row, one row after the other: of an image at a shift,
+// or sampled before.
+template <std::size_t C, class D, class T>
+struct TranslatedRows {
+  TranslatedRows(D d, const T* first, std::size_t image_stride, float fx, float fy)
+      : in(first),
+        stride(image_stride),
+        wx(hn::Set(d, fx)),
+        wy(hn::Set(d, fy)),
+        above(SlopeAt(d, first, C).At(wx)) {}
+  HWY_INLINE hn::Vec<D> Next(D d) {
+    in += stride;
+    const auto below = SlopeAt(d, in, C).At(wx);
+    const auto sample = Lerp(above, below, wy);
+    above = below;
+    return sample;
+  }
+
+  const T* in;
+  std::size_t stride;
+  hn::Vec<D> wx, wy, above;
+};
 template <class D>
-HWY_INLINE void SplitVector(D d, const float* centre, std::size_t channels, std::size_t stride,
-                            float* t, float* gx, float* gy) {
-  hn::StoreU(hn::LoadU(d, centre), d, t);
-  hn::StoreU(hn::Sub(hn::LoadU(d, centre + channels), hn::LoadU(d, centre - channels)), d, gx);
-  hn::StoreU(hn::Sub(hn::LoadU(d, centre + stride), hn::LoadU(d, centre - stride)), d, gy);
-}
+struct SampledRows {
+  HWY_INLINE hn::Vec<D> Next(D d) {
+    const auto sample = hn::LoadU(d, in);
+    in += stride;
+    return sample;
+  }
 
-void SplitGradients(const float* block, const window_shape& shape, float* t, float* gx, float* gy) {
-  const Lanes d;
-  const std::size_t N = hn::Lanes(d);
-  const std::size_t C = shape.channels;
-  const std::size_t length = shape.columns() * C;
-  const std::size_t stride = length + 2 * C;
-  for (std::size_t row = 0; row < shape.rows(); ++row) {
-    const float* centre = block + (row + 1) * stride + C;
-    const std::size_t o = row * length;
-    std::size_t i = 0;
-    for (; i + N <= length; i += N) {
-      SplitVector(d, centre + i, C, stride, t + o + i, gx + o + i, gy + o + i);
+  const float* in;
+  std::size_t stride;
+};
+
+// Adds what the residuals of one vector in each row tell.
+template <std::size_t C, bool kAffine, bool kColor, class D, class Rows, class Keep>
+HWY_NOINLINE void AddResiduals(D d, std::size_t i, const float* t, window_shape shape, Rows rows,
+                               Keep keep, ResidualSums<C>& sums) {
+  const std::size_t stride = shape.stride();
+  auto gain = hn::Zero(d), bias = hn::Zero(d);
+  if constexpr (kColor) {
+    gain = sums.gain.At(d, i);
+    bias = sums.bias.At(d, i);
+  }
+  // u is the same in every row, so that it has to meet the sums of the rows only.
+  auto x = hn::Zero(d), y = hn::Zero(d), vx = hn::Zero(d), vy = hn::Zero(d);
+  auto tr = hn::Zero(d), ones = hn::Zero(d);
+  t += i;
+  auto t_above = hn::LoadU(d, t - stride);
+  auto t_here = hn::LoadU(d, t);
+  auto v = hn::Set(d, -static_cast<float>(shape.half_y));
+  for (std::size_t row = 0; row < shape.rows(); ++row, t += stride) {
+    auto present = rows.Next(d);
+    if constexpr (kColor) present = hn::MulAdd(gain, present, bias);
+    const auto r = keep(hn::Sub(t_here, present));
+    const auto t_below = hn::LoadU(d, t + stride);
+    const auto gx = hn::Sub(hn::LoadU(d, t + C), hn::LoadU(d, t - C));
+    const auto gy = hn::Sub(t_below, t_above);
+    if constexpr (kAffine) {
+      const auto gxr = hn::Mul(gx, r);
+      const auto gyr = hn::Mul(gy, r);
+      x = hn::Add(x, gxr);
+      y = hn::Add(y, gyr);
+      vx = hn::MulAdd(v, gxr, vx);
+      vy = hn::MulAdd(v, gyr, vy);
+      v = hn::Add(v, hn::Set(d, 1.0f));
+    } else {
+      x = hn::MulAdd(gx, r, x);
+      y = hn::MulAdd(gy, r, y);
     }
-    if (i < length && length >= N) {  // the last vector overlaps the one before
-      i = length - N;
-      SplitVector(d, centre + i, C, stride, t + o + i, gx + o + i, gy + o + i);
-      continue;
+    if constexpr (kColor) {
+      tr = hn::MulAdd(t_here, r, tr);
+      ones = hn::Add(ones, r);
     }
-    for (; i < length; ++i) {
-      SplitVector(hn::CappedTag<float, 1>(), centre + i, C, stride, t + o + i, gx + o + i,
-                  gy + o + i);
-    }
+    t_above = t_here;
+    t_here = t_below;
+  }
+  sums.motion[0].Add(d, i, x);
+  sums.motion[1].Add(d, i, y);
+  if constexpr (kAffine) {
+    const auto u = OffsetsU<C>(d, i, shape);
+    sums.motion[2].Add(d, i, hn::Mul(u, x));
+    sums.motion[3].Add(d, i, vx);
+    sums.motion[4].Add(d, i, hn::Mul(u, y));
+    sums.motion[5].Add(d, i, vy);
+  }
+  if constexpr (kColor) {
+    sums.tr.Add(d, i, tr);
+    sums.ones.Add(d, i, ones);
   }
 }
 
-// One pixel: its channels from the four around it. `kWide` reads and writes four samples for three.
-template <std::size_t C, bool kWide, class T>
+template <std::size_t C, bool kColor, class T>
+HWY_INLINE void TranslationSums(const float* t, const T* image, std::size_t image_width,
+                                std::size_t image_height, translated_sampling place,
+                                window_shape shape, const color_fit& color, double* totals) {
+  const std::size_t in_stride = image_width * C;
+  const std::size_t first = place.y * in_stride + place.x * C;
+  ResidualSums<C> sums;
+  if constexpr (kColor) {
+    sums.gain.SpreadChannels(color.gain);
+    sums.bias.SpreadChannels(color.bias);
+  }
+  const auto add = [&](auto d, std::size_t i, auto keep) WINDOW_LAMBDA {
+    const TranslatedRows<C, decltype(d), T> rows(d, image + first + i, in_stride, place.fx,
+                                                 place.fy);
+    AddResiduals<C, false, kColor>(d, i, t, shape, rows, keep, sums);
+  };
+  // Whole vectors read on behind the window's last pixel, which may lie behind the image.
+  const bool wide =
+      first + shape.rows() * in_stride + C + shape.stride() <= in_stride * image_height;
+  const std::size_t end = shape.row_samples();
+  const std::size_t whole = end - end % kLanes;
+  ForEachColumn(shape, [&](std::size_t i, auto keep) WINDOW_LAMBDA {
+    if (i < whole || wide) add(Lanes(), i, keep);
+  });
+  for (std::size_t i = wide ? end : whole; i < end; ++i) {
+    add(hn::CappedTag<float, 1>(), i, [](auto v) WINDOW_LAMBDA { return v; });
+  }
+  for (std::size_t m = 0; m < 2; ++m) totals[m] = sums.motion[m].Total();
+  if constexpr (kColor) {
+    sums.tr.TotalsByChannel(totals + 2, 2);
+    sums.ones.TotalsByChannel(totals + 3, 2);
+  }
+}
+
+template <class T>
+HWY_INLINE void TranslationResidual(const float* t, const T* image, std::size_t image_width,
+                                    std::size_t image_height, translated_sampling place,
+                                    window_shape shape, const color_fit& color, double* sums) {
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
+    constexpr std::size_t C = decltype(channels)::value;
+    if (color.gain != nullptr) {
+      TranslationSums<C, true>(t, image, image_width, image_height, place, shape, color, sums);
+    } else {
+      TranslationSums<C, false>(t, image, image_width, image_height, place, shape, color, sums);
+    }
+  });
+}
+
+void TranslationResidualFloats(const float* t, const float* image, std::size_t image_width,
+                               std::size_t image_height, const translated_sampling& place,
+                               const window_shape& shape, const color_fit& color, double* sums) {
+  TranslationResidual(t, image, image_width, image_height, place, shape, color, sums);
+}
+
+void TranslationResidualBytes(const float* t, const std::uint8_t* image, std::size_t image_width,
+                              std::size_t image_height, const translated_sampling& place,
+                              const window_shape& shape, const color_fit& color, double* sums) {
+  TranslationResidual(t, image, image_width, image_height, place, shape, color, sums);
+}
+
+// One pixel: its channels from the four around it.
+template <std::size_t C, class T>
 HWY_INLINE void SamplePixel(const T* in, std::size_t stride, float fx, float fy, float* out) {
-  const hn::CappedTag<float, kWide ? 4 : 1> d;
+  const hn::CappedTag<float, 1> d;
   const auto wx = hn::Set(d, fx);
   const auto wy = hn::Set(d, fy);
-  for (std::size_t c = 0; c < (kWide ? 1 : C); ++c) {
-    const T* p = in + c;
-    const auto above = Lerp(LoadSamples(d, p), LoadSamples(d, p + C), wx);
-    const auto below = Lerp(LoadSamples(d, p + stride), LoadSamples(d, p + stride + C), wx);
+  for (std::size_t c = 0; c < C; ++c) {
+    const auto above = SlopeAt(d, in + c, C).At(wx);
+    const auto below = SlopeAt(d, in + c + stride, C).At(wx);
     hn::StoreU(Lerp(above, below, wy), d, out + c);
   }
 }
 
-// Where N neighbouring pixels of a row come from: the four samples about each start at offset[j].
-struct PixelPlaces {
-  HWY_ALIGN std::int32_t offset[16];
-  HWY_ALIGN float fx[16];
-  HWY_ALIGN float fy[16];
-  std::uint32_t jumps = 0;  // bit j: pixel j + 1 is not read right beside pixel j
-};
-
-template <std::size_t C, bool kWide, class T>
-HWY_INLINE void SamplePixels(const T* origin, std::size_t stride, const PixelPlaces& places,
-                             std::size_t first, std::size_t end, float* out) {
-  for (std::size_t j = first; j < end; ++j) {
-    SamplePixel<C, kWide>(origin + places.offset[j], stride, places.fx[j], places.fy[j],
-                          out + j * C);
+// Samples up to N columns of a window, from `column` on: one pixel after the other.
+template <std::size_t C, class T>
+HWY_INLINE void SampleAffinePixels(const T* origin, std::size_t stride, std::size_t count,
+                                   Vector x_floor, Vector y_floor, Vector fx, Vector fy,
+                                   float* out) {
+  const Lanes d;
+  HWY_ALIGN float places[4][kLanes];
+  hn::Store(x_floor, d, places[0]);
+  hn::Store(y_floor, d, places[1]);
+  hn::Store(fx, d, places[2]);
+  hn::Store(fy, d, places[3]);
+  for (std::size_t j = 0; j < count; ++j) {
+    const auto x = static_cast<std::ptrdiff_t>(places[0][j]);
+    const auto y = static_cast<std::ptrdiff_t>(places[1][j]);
+    SamplePixel<C>(
+        origin + y * static_cast<std::ptrdiff_t>(stride) + x * static_cast<std::ptrdiff_t>(C),
+        stride, places[2][j], places[3][j], out + j * C);
   }
 }
 
-// A warp is near the identity: most neighbours are read side by side, so that a vector of samples
-// comes in one piece, and each lane differs from a shift only by its pixel's fractions. kWide
-// allows to read a vector past a pixel's four, and to write as much past all rows but the last.
+// Samples up to N columns of a window, from `column` on. A warp is near the identity: most
+// neighbours are read side by side, so that a vector of samples comes in one piece, or in a few,
+// and each lane differs from a shift only by its pixel's fractions; and what was read for the lower
+// side of a row's pixels is mostly the upper side of the next row's. kWide is for warps of which
+// ReadsWide is true.
 template <std::size_t C, bool kWide, class T>
-HWY_INLINE void SampleAffineRows(const T* image, std::size_t image_width,
-                                 const affine_sampling& warp, const window_shape& shape,
-                                 float* out) {
+HWY_NOINLINE void SampleAffineStrip(const T* image, std::size_t image_width, affine_sampling warp,
+                                    window_shape shape, std::size_t column, float* out) {
   const Lanes d;
   const hn::RebindToSigned<Lanes> di;
-  const std::size_t N = hn::Lanes(d);
+  constexpr std::size_t N = kLanes;
   const std::size_t stride = image_width * C;
-  const auto pixel_step = hn::Set(di, static_cast<std::int32_t>(C));
-  const auto row_step = hn::Set(di, static_cast<std::int32_t>(stride));
+  const std::size_t out_stride = shape.stride();
+  const std::size_t count = std::min(N, shape.columns() - column);
   const auto m00 = hn::Set(d, warp.m00);
   const auto m10 = hn::Set(d, warp.m10);
   const T* origin = image + warp.y * static_cast<std::ptrdiff_t>(stride) +
                     warp.x * static_cast<std::ptrdiff_t>(C);
-  // Pixel of each sample of C vectors.
-  HWY_ALIGN std::int32_t pixel_of[16 * C];
-  for (std::size_t i = 0; i < C * N; ++i) pixel_of[i] = static_cast<std::int32_t>(i / C);
-  PixelPlaces places;
-  HWY_ALIGN std::int32_t next_lane[16];  // the last one has none, and none is asked for
-  for (std::size_t j = 0; j < N; ++j)
-    next_lane[j] = static_cast<std::int32_t>(std::min(j + 1, N - 1));
-  const auto next = hn::SetTableIndices(di, next_lane);
-  const auto half_x = static_cast<float>(shape.half_x);
-  for (std::size_t row = 0; row < shape.rows(); ++row) {
-    const float v = static_cast<float>(row) - static_cast<float>(shape.half_y);
-    const auto row_x = hn::MulAdd(hn::Set(d, warp.m01), hn::Set(d, v), hn::Set(d, warp.fx));
-    const auto row_y = hn::MulAdd(hn::Set(d, warp.m11), hn::Set(d, v), hn::Set(d, warp.fy));
-    const bool last_row = row + 1 == shape.rows();
-    for (std::size_t column = 0; column < shape.columns(); column += N) {
-      const auto u = hn::Iota(d, static_cast<float>(column) - half_x);
-      const auto x = hn::MulAdd(m00, u, row_x);
-      const auto y = hn::MulAdd(m10, u, row_y);
-      const auto x_floor = hn::Floor(x);
-      const auto y_floor = hn::Floor(y);
-      const auto fx = hn::Sub(x, x_floor);
-      const auto fy = hn::Sub(y, y_floor);
-      const auto offset = hn::Add(hn::Mul(hn::ConvertTo(di, x_floor), pixel_step),
-                                  hn::Mul(hn::ConvertTo(di, y_floor), row_step));
-      hn::Store(fx, d, places.fx);
-      hn::Store(fy, d, places.fy);
-      hn::Store(offset, di, places.offset);
-      const std::size_t count = std::min(N, shape.columns() - column);
-      if constexpr (!kWide) {
-        SamplePixels<C, kWide>(origin, stride, places, 0, count, out);
-      } else {
-        const auto jump = hn::Ne(hn::Sub(hn::TableLookupLanes(offset, next), offset), pixel_step);
-        std::uint8_t bits[8] = {};
-        hn::StoreMaskBits(di, jump, bits);
-        places.jumps = bits[0] | static_cast<std::uint32_t>(bits[1]) << 8;
-        for (std::size_t k = 0; k * N < count * C; ++k) {
-          const std::size_t first = k * N / C;
-          const std::size_t end = std::min(((k + 1) * N - 1) / C + 1, count);
-          const std::uint32_t inside = (1u << (end - 1)) - (1u << first);
-          const bool whole = (k + 1) * N <= count * C || !last_row;
-          if ((places.jumps & inside) != 0 || !whole) {
-            SamplePixels<C, kWide>(origin, stride, places, first, end, out);
-            continue;
-          }
-          const T* in = origin + places.offset[first] + (k * N - first * C);
-          const auto pixel = hn::SetTableIndices(d, pixel_of + k * N);
-          const auto wx = hn::TableLookupLanes(fx, pixel);
-          const auto wy = hn::TableLookupLanes(fy, pixel);
-          const auto above = Lerp(LoadSamples(d, in), LoadSamples(d, in + C), wx);
-          const auto below = Lerp(LoadSamples(d, in + stride), LoadSamples(d, in + stride + C), wx);
-          hn::StoreU(Lerp(above, below, wy), d, out + k * N);
-        }
-      }
-      out += count * C;
+  // The last lane has no next one, and none is asked for.
+  const auto next = hn::IndicesFromVec(
+      di, hn::Min(hn::Iota(di, 1), hn::Set(di, static_cast<std::int32_t>(N) - 1)));
+  const auto u = hn::Iota(d, static_cast<float>(column) - static_cast<float>(shape.half_x));
+  HWY_ALIGN std::int32_t offset[N];
+  Slope<Vector> lower[C];
+  std::int32_t lower_offset[C];  // of its first pixel
+  Unrolled<C>([&](auto k) WINDOW_LAMBDA {
+    lower[k] = {hn::Zero(d), hn::Zero(d)};
+    lower_offset[k] = std::numeric_limits<std::int32_t>::min();
+  });
+  out += column * C;
+  auto v = hn::Set(d, -static_cast<float>(shape.half_y));
+  for (std::size_t row = 0; row < shape.rows(); ++row, out += out_stride) {
+    const auto x = hn::MulAdd(m00, u, hn::MulAdd(hn::Set(d, warp.m01), v, hn::Set(d, warp.fx)));
+    const auto y = hn::MulAdd(m10, u, hn::MulAdd(hn::Set(d, warp.m11), v, hn::Set(d, warp.fy)));
+    v = hn::Add(v, hn::Set(d, 1.0f));
+    const auto x_floor = hn::Floor(x);
+    const auto y_floor = hn::Floor(y);
+    const auto fx = hn::Sub(x, x_floor);
+    const auto fy = hn::Sub(y, y_floor);
+    if constexpr (!kWide) {
+      SampleAffinePixels<C>(origin, stride, count, x_floor, y_floor, fx, fy, out);
+      continue;
     }
+    const auto offsets =
+        hn::ConvertTo(di, hn::MulAdd(y_floor, hn::Set(d, static_cast<float>(stride)),
+                                     hn::Mul(x_floor, hn::Set(d, static_cast<float>(C)))));
+    hn::Store(offsets, di, offset);
+    // Bit j: pixel j + 1 is not read right beside pixel j.
+    const auto jump = hn::Ne(hn::Sub(hn::TableLookupLanes(offsets, next), offsets),
+                             hn::Set(di, static_cast<std::int32_t>(C)));
+    std::uint8_t bits[8] = {};
+    hn::StoreMaskBits(di, jump, bits);
+    const std::uint32_t jumps =
+        (bits[0] | static_cast<std::uint32_t>(bits[1]) << 8) & ((1u << (count - 1)) - 1);
+    Unrolled<C>([&](auto k) WINDOW_LAMBDA {
+      if (k * N >= count * C) return;
+      constexpr std::size_t first = k * N / C;
+      constexpr std::size_t last = ((k + 1) * N - 1) / C;
+      const T* in = origin + offset[first] + (k * N - first * C);
+      const std::uint32_t inside = jumps & ((1u << last) - (1u << first));
+      Slope<Vector> upper;
+      if (inside == 0) {
+        upper = offset[first] == lower_offset[k] ? lower[k] : SlopeAt(d, in, C);
+        lower[k] = SlopeAt(d, in + stride, C);
+        lower_offset[k] = offset[first] + static_cast<std::int32_t>(stride);
+      } else {
+        auto upper_left = LoadRaw(d, in);
+        auto upper_right = LoadRaw(d, in + C);
+        auto lower_left = LoadRaw(d, in + stride);
+        auto lower_right = LoadRaw(d, in + stride + C);
+        for (std::uint32_t left = inside; left != 0; left &= left - 1) {
+          const std::size_t pixel = static_cast<std::size_t>(std::countr_zero(left)) + 1;
+          const std::size_t lanes_before = pixel * C - k * N;
+          const auto before = hn::FirstN(hn::DFromV<decltype(upper_left)>(), lanes_before);
+          in = origin + offset[pixel] - lanes_before;
+          upper_left = hn::IfThenElse(before, upper_left, LoadRaw(d, in));
+          upper_right = hn::IfThenElse(before, upper_right, LoadRaw(d, in + C));
+          lower_left = hn::IfThenElse(before, lower_left, LoadRaw(d, in + stride));
+          lower_right = hn::IfThenElse(before, lower_right, LoadRaw(d, in + stride + C));
+        }
+        upper = SlopeOf(d, upper_left, upper_right);
+        lower[k] = SlopeOf(d, lower_left, lower_right);
+        lower_offset[k] = std::numeric_limits<std::int32_t>::min();
+      }
+      const auto pixels = hn::SetTableIndices(d, kPixelOfSample<C>.index + k * N);
+      const auto wx = hn::TableLookupLanes(fx, pixels);
+      const auto wy = hn::TableLookupLanes(fy, pixels);
+      hn::StoreU(Lerp(upper.At(wx), lower[k].At(wx), wy), d, out + k * N);
+    });
   }
-  *out = 0.0f;
 }
 
-// The corners, by the arithmetic of the rows above: rounding is monotonic, so that no sample of the
-// window lies outside of what its corners span.
+// The corners, by the arithmetic of the strips above: rounding is monotonic, so that no sample of
+// the window lies outside of what its corners span.
 bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
                         std::size_t image_width, std::size_t image_height) {
   const hn::CappedTag<float, 1> d;
@@ -317,24 +585,35 @@ bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
   return true;
 }
 
+// Whether reads from any of the warped pixels may go a vector too far either way, because the rows
+// about the window's are in the image too, and floats hold the pixels' distances.
+HWY_INLINE bool ReadsWide(affine_sampling warp, window_shape shape, std::size_t image_width,
+                          std::size_t image_height) {
+  const auto half_x = static_cast<float>(shape.half_x);
+  const auto half_y = static_cast<float>(shape.half_y);
+  const float reach_x = std::abs(warp.m00) * half_x + std::abs(warp.m01) * half_y + 3.0f;
+  const float reach_y = std::abs(warp.m10) * half_x + std::abs(warp.m11) * half_y + 3.0f;
+  const auto y = static_cast<float>(warp.y);
+  return image_width >= kWindowLanes && y - reach_y > 0.0f &&
+         y + reach_y < static_cast<float>(image_height) - 1.0f &&
+         (reach_y * static_cast<float>(image_width) + reach_x) *
+                 static_cast<float>(shape.channels) <
+             16e6f;
+}
+
 template <class T>
 HWY_INLINE void SampleWarped(const T* image, std::size_t image_width, std::size_t image_height,
-                             const affine_sampling& warp, const window_shape& shape, float* out) {
-  // Wide reads go on behind a pixel's right neighbour, which on the image's last row may lie behind
-  // the image.
-  const float reach = std::max(warp.m10, -warp.m10) * static_cast<float>(shape.half_x) +
-                      std::max(warp.m11, -warp.m11) * static_cast<float>(shape.half_y) + 3.0f;
-  const bool clear_of_last_row =
-      HWY_TARGET != HWY_SCALAR && image_width >= 16 &&
-      static_cast<float>(warp.y) + reach < static_cast<float>(image_height) - 1.0f;
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
+                             affine_sampling warp, window_shape shape, float* out) {
+  const bool wide = ReadsWide(warp, shape, image_width, image_height);
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
-    if constexpr (C >= 3) {
-      if (clear_of_last_row) {
-        return SampleAffineRows<C, true>(image, image_width, warp, shape, out);
+    for (std::size_t column = 0; column < shape.columns(); column += kLanes) {
+      if (wide) {
+        SampleAffineStrip<C, true>(image, image_width, warp, shape, column, out);
+      } else {
+        SampleAffineStrip<C, false>(image, image_width, warp, shape, column, out);
       }
     }
-    SampleAffineRows<C, false>(image, image_width, warp, shape, out);
   });
 }
 
@@ -348,190 +627,165 @@ void SampleAffineBytes(const std::uint8_t* image, std::size_t image_width, std::
   SampleWarped(image, image_width, image_height, warp, shape, out);
 }
 
-void GradientProducts(const template_planes& level, const window_shape& shape, double sums[3]) {
+template <std::size_t C, bool kColor>
+HWY_INLINE void AffineSums(const float* t, const float* window, window_shape shape,
+                           const color_fit& color, double* totals) {
   const Lanes d;
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
-    constexpr std::size_t C = decltype(channels)::value;
-    Vector xx[C], xy[C], yy[C];
-    for (std::size_t k = 0; k < C; ++k) xx[k] = xy[k] = yy[k] = hn::Zero(d);
-    ForEachVector<C>(shape.samples(), [&](std::size_t i, std::size_t k, auto) HWY_ATTR {
-      const auto gx = hn::LoadU(d, level.gx + i);
-      const auto gy = hn::LoadU(d, level.gy + i);
-      xx[k] = hn::MulAdd(gx, gx, xx[k]);
-      xy[k] = hn::MulAdd(gx, gy, xy[k]);
-      yy[k] = hn::MulAdd(gy, gy, yy[k]);
-    });
-    sums[0] = sums[1] = sums[2] = 0.0;
-    for (std::size_t k = 0; k < C; ++k) {
-      sums[0] += Total(xx[k]);
-      sums[1] += Total(xy[k]);
-      sums[2] += Total(yy[k]);
-    }
-  });
-}
-
-// Motion sums of both stages; the affine one has the four sums with u and v as well.
-template <std::size_t C, bool kAffine, bool kColor, bool kPerChannel>
-HWY_INLINE void Residual(const template_planes& level, const offset_planes& offsets,
-                         const float* window, const window_shape& shape, const color_fit& color,
-                         double* sums) {
-  const Lanes d;
-  constexpr std::size_t kMotion = kAffine ? 6 : 2;
-  Vector gain[C], bias[C], tr[C], ones[C], x[C], y[C], motion[4];
+  ResidualSums<C> sums;
   if constexpr (kColor) {
-    SpreadChannels<C>(color.gain, gain);
-    SpreadChannels<C>(color.bias, bias);
+    sums.gain.SpreadChannels(color.gain);
+    sums.bias.SpreadChannels(color.bias);
   }
-  for (std::size_t k = 0; k < C; ++k) tr[k] = ones[k] = x[k] = y[k] = hn::Zero(d);
-  for (auto& m : motion) m = hn::Zero(d);
-  ForEachVector<C>(shape.samples(), [&](std::size_t i, std::size_t k, auto keep) HWY_ATTR {
-    const auto t = hn::LoadU(d, level.t + i);
-    auto sample = hn::LoadU(d, window + i);
-    if constexpr (kColor) sample = hn::MulAdd(gain[k], sample, bias[k]);
-    const auto r = hn::Sub(t, sample);
-    const auto gx = hn::Mul(hn::LoadU(d, level.gx + i), r);
-    const auto gy = hn::Mul(hn::LoadU(d, level.gy + i), r);
-    x[k] = hn::Add(gx, x[k]);
-    y[k] = hn::Add(gy, y[k]);
-    if constexpr (kAffine) {
-      const auto u = hn::LoadU(d, offsets.u + i);
-      const auto v = hn::LoadU(d, offsets.v + i);
-      motion[0] = hn::MulAdd(u, gx, motion[0]);
-      motion[1] = hn::MulAdd(v, gx, motion[1]);
-      motion[2] = hn::MulAdd(u, gy, motion[2]);
-      motion[3] = hn::MulAdd(v, gy, motion[3]);
-    }
-    if constexpr (kPerChannel) {
-      tr[k] = hn::MulAdd(t, r, tr[k]);
-      ones[k] = hn::Add(keep(r), ones[k]);
-    }
+  ForEachColumn(shape, [&](std::size_t i, auto keep) WINDOW_LAMBDA {
+    AddResiduals<C, true, kColor>(d, i, t, shape, SampledRows<Lanes>{window + i, shape.stride()},
+                                  keep, sums);
   });
-  std::fill_n(sums, kMotion + (kPerChannel ? 2 * C : 0), 0.0);
-  for (std::size_t k = 0; k < C; ++k) {
-    sums[0] += Total(x[k]);
-    sums[1] += Total(y[k]);
-  }
-  for (std::size_t m = 2; m < kMotion; ++m) sums[m] = Total(motion[m - 2]);
-  if constexpr (kPerChannel) {
-    AddByChannel<C>(tr, sums + kMotion, 2);
-    AddByChannel<C>(ones, sums + kMotion + 1, 2);
+  for (std::size_t m = 0; m < 6; ++m) totals[m] = sums.motion[m].Total();
+  if constexpr (kColor) {
+    sums.tr.TotalsByChannel(totals + 6, 2);
+    sums.ones.TotalsByChannel(totals + 7, 2);
   }
 }
 
-void TranslationResidual(const template_planes& level, const float* window,
-                         const window_shape& shape, const color_fit& color, bool per_channel,
-                         double* sums) {
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
-    constexpr std::size_t C = decltype(channels)::value;
-    if (per_channel) {
-      Residual<C, false, true, true>(level, {}, window, shape, color, sums);
-    } else if (color.gain != nullptr) {
-      Residual<C, false, true, false>(level, {}, window, shape, color, sums);
-    } else {
-      Residual<C, false, false, false>(level, {}, window, shape, color, sums);
-    }
-  });
-}
-
-void AffineResidual(const template_planes& level, const offset_planes& offsets, const float* window,
-                    const window_shape& shape, const color_fit& color, double* sums) {
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
+void AffineResidual(const float* t, const float* window, const window_shape& shape,
+                    const color_fit& color, double* sums) {
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
     if (color.gain != nullptr) {
-      Residual<C, true, true, true>(level, offsets, window, shape, color, sums);
+      AffineSums<C, true>(t, window, shape, color, sums);
     } else {
-      Residual<C, true, false, false>(level, offsets, window, shape, color, sums);
+      AffineSums<C, false>(t, window, shape, color, sums);
     }
   });
 }
 
-void TemplateProducts(const template_planes& level, const offset_planes& offsets,
-                      const window_shape& shape, template_products& products) {
+void GradientProducts(const float* t, const window_shape& shape, double sums[3]) {
   const Lanes d;
+  const std::size_t C = shape.channels;
+  const std::size_t stride = shape.stride();
+  PerSample<1> products[3] = {};
+  ForEachColumn(shape, [&](std::size_t i, auto keep) WINDOW_LAMBDA {
+    auto xx = products[0].At(d, i);
+    auto xy = products[1].At(d, i);
+    auto yy = products[2].At(d, i);
+    const float* p = t + i;
+    auto above = hn::LoadU(d, p - stride);
+    auto here = hn::LoadU(d, p);
+    for (std::size_t row = 0; row < shape.rows(); ++row, p += stride) {
+      const auto below = hn::LoadU(d, p + stride);
+      const auto gx = keep(hn::Sub(hn::LoadU(d, p + C), hn::LoadU(d, p - C)));
+      const auto gy = keep(hn::Sub(below, above));
+      above = here;
+      here = below;
+      xx = hn::MulAdd(gx, gx, xx);
+      xy = hn::MulAdd(gx, gy, xy);
+      yy = hn::MulAdd(gy, gy, yy);
+    }
+    products[0].Set(d, i, xx);
+    products[1].Set(d, i, xy);
+    products[2].Set(d, i, yy);
+  });
+  for (std::size_t p = 0; p < 3; ++p) sums[p] = products[p].Total();
+}
+
+void TemplateProducts(const float* t, const window_shape& shape, template_products& products) {
+  const Lanes d;
+  const std::size_t stride = shape.stride();
   products = {};
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
-    Vector gradient[3][6];
-    Vector cross[4][3][C];
-    Vector square[C], sum[C];
-    for (auto& row : gradient) {
-      for (auto& entry : row) entry = hn::Zero(d);
-    }
-    for (auto& row : cross) {
-      for (auto& entry : row) {
-        for (auto& channel : entry) channel = hn::Zero(d);
+    PerSample<1> gradient[3][6] = {};
+    PerSample<C> cross[4][3] = {};
+    PerSample<C> square = {}, sum = {};
+    ForEachColumn(shape, [&](std::size_t i, auto keep) WINDOW_LAMBDA {
+      // Times 1, v and v v; u is the same in every row, so that it has to meet the sums only.
+      Vector pairs[3][3], factors[4][2];
+      for (auto& entry : pairs) entry[0] = entry[1] = entry[2] = hn::Zero(d);
+      for (auto& entry : factors) entry[0] = entry[1] = hn::Zero(d);
+      auto squares = hn::Zero(d);
+      auto values = hn::Zero(d);
+      auto v = hn::Set(d, -static_cast<float>(shape.half_y));
+      const float* p = t + i;
+      for (std::size_t row = 0; row < shape.rows(); ++row, p += stride) {
+        const auto here = keep(hn::LoadU(d, p));
+        const auto gx = keep(hn::Sub(hn::LoadU(d, p + C), hn::LoadU(d, p - C)));
+        const auto gy = keep(hn::Sub(hn::LoadU(d, p + stride), hn::LoadU(d, p - stride)));
+        const Vector pair[3] = {hn::Mul(gx, gx), hn::Mul(gx, gy), hn::Mul(gy, gy)};
+        for (std::size_t q = 0; q < 3; ++q) {
+          const auto pv = hn::Mul(pair[q], v);
+          pairs[q][0] = hn::Add(pairs[q][0], pair[q]);
+          pairs[q][1] = hn::Add(pairs[q][1], pv);
+          pairs[q][2] = hn::MulAdd(pv, v, pairs[q][2]);
+        }
+        const Vector factor[4] = {hn::Mul(gx, here), hn::Mul(gy, here), gx, gy};
+        for (std::size_t q = 0; q < 4; ++q) {
+          factors[q][0] = hn::Add(factors[q][0], factor[q]);
+          factors[q][1] = hn::MulAdd(factor[q], v, factors[q][1]);
+        }
+        v = hn::Add(v, hn::Set(d, 1.0f));
+        squares = hn::MulAdd(here, here, squares);
+        values = hn::Add(values, here);
       }
-    }
-    for (std::size_t k = 0; k < C; ++k) square[k] = sum[k] = hn::Zero(d);
-    ForEachVector<C>(shape.samples(), [&](std::size_t i, std::size_t k, auto) HWY_ATTR {
-      const auto t = hn::LoadU(d, level.t + i);
-      const auto gx = hn::LoadU(d, level.gx + i);
-      const auto gy = hn::LoadU(d, level.gy + i);
-      const auto u = hn::LoadU(d, offsets.u + i);
-      const auto v = hn::LoadU(d, offsets.v + i);
-      const Vector pairs[3] = {hn::Mul(gx, gx), hn::Mul(gx, gy), hn::Mul(gy, gy)};
-      for (std::size_t p = 0; p < 3; ++p) {
-        const auto pu = hn::Mul(pairs[p], u);
-        const auto pv = hn::Mul(pairs[p], v);
-        gradient[p][0] = hn::Add(pairs[p], gradient[p][0]);
-        gradient[p][1] = hn::Add(pu, gradient[p][1]);
-        gradient[p][2] = hn::Add(pv, gradient[p][2]);
-        gradient[p][3] = hn::MulAdd(pu, u, gradient[p][3]);
-        gradient[p][4] = hn::MulAdd(pu, v, gradient[p][4]);
-        gradient[p][5] = hn::MulAdd(pv, v, gradient[p][5]);
+      const auto u = OffsetsU<C>(d, i, shape);
+      for (std::size_t q = 0; q < 3; ++q) {
+        const auto pu = hn::Mul(pairs[q][0], u);
+        gradient[q][0].Add(d, i, pairs[q][0]);
+        gradient[q][1].Add(d, i, pu);
+        gradient[q][2].Add(d, i, pairs[q][1]);
+        gradient[q][3].Add(d, i, hn::Mul(pu, u));
+        gradient[q][4].Add(d, i, hn::Mul(pairs[q][1], u));
+        gradient[q][5].Add(d, i, pairs[q][2]);
       }
-      const Vector factors[4] = {hn::Mul(gx, t), hn::Mul(gy, t), gx, gy};
-      for (std::size_t p = 0; p < 4; ++p) {
-        cross[p][0][k] = hn::Add(factors[p], cross[p][0][k]);
-        cross[p][1][k] = hn::MulAdd(factors[p], u, cross[p][1][k]);
-        cross[p][2][k] = hn::MulAdd(factors[p], v, cross[p][2][k]);
+      for (std::size_t q = 0; q < 4; ++q) {
+        cross[q][0].Add(d, i, factors[q][0]);
+        cross[q][1].Add(d, i, hn::Mul(factors[q][0], u));
+        cross[q][2].Add(d, i, factors[q][1]);
       }
-      square[k] = hn::MulAdd(t, t, square[k]);
-      sum[k] = hn::Add(t, sum[k]);
+      square.Add(d, i, squares);
+      sum.Add(d, i, values);
     });
     for (std::size_t p = 0; p < 3; ++p) {
-      for (std::size_t q = 0; q < 6; ++q) products.gradient[p][q] = Total(gradient[p][q]);
+      for (std::size_t q = 0; q < 6; ++q) products.gradient[p][q] = gradient[p][q].Total();
     }
     for (std::size_t p = 0; p < 4; ++p) {
       for (std::size_t q = 0; q < 3; ++q) {
-        double by_channel[C] = {};
-        AddByChannel<C>(cross[p][q], by_channel, 1);
+        double by_channel[C];
+        cross[p][q].TotalsByChannel(by_channel, 1);
         for (std::size_t c = 0; c < C; ++c) products.cross[c][p][q] = by_channel[c];
       }
     }
-    AddByChannel<C>(square, products.square, 1);
-    AddByChannel<C>(sum, products.sum, 1);
+    square.TotalsByChannel(products.square, 1);
+    sum.TotalsByChannel(products.sum, 1);
   });
 }
 
 void ChannelEnergies(const float* t, const window_shape& shape, double* energies) {
   const Lanes d;
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
-    Vector square[C];
-    for (auto& s : square) s = hn::Zero(d);
-    ForEachVector<C>(shape.samples(), [&](std::size_t i, std::size_t k, auto keep) HWY_ATTR {
-      const auto x = keep(hn::LoadU(d, t + i));
-      square[k] = hn::MulAdd(x, x, square[k]);
+    RowSums<C> square;
+    ForEachVector<C>(shape, [&](std::size_t at, auto k, auto keep) WINDOW_LAMBDA {
+      const auto x = keep(hn::LoadU(d, t + at));
+      square.sum[k] = hn::MulAdd(x, x, square.sum[k]);
     });
-    std::fill_n(energies, C, 0.0);
-    AddByChannel<C>(square, energies, 1);
+    square.ByChannel(energies);
   });
 }
 
 void ChannelMeans(const float* window, const window_shape& shape, float* means) {
   const Lanes d;
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
     // Differences from the first pixel, so that a flat channel's mean has no rounding error.
-    Vector pivot[C], sum[C];
-    SpreadChannels<C>(window, pivot);
-    for (auto& s : sum) s = hn::Zero(d);
-    ForEachVector<C>(shape.samples(), [&](std::size_t i, std::size_t k, auto keep) HWY_ATTR {
-      sum[k] = hn::Add(keep(hn::Sub(hn::LoadU(d, window + i), pivot[k])), sum[k]);
+    PerSample<C> pivot;
+    pivot.SpreadChannels(window);
+    RowSums<C> differences;
+    ForEachVector<C>(shape, [&](std::size_t at, auto k, auto keep) WINDOW_LAMBDA {
+      const auto x = hn::LoadU(d, window + at);
+      differences.sum[k] = hn::Add(differences.sum[k], keep(hn::Sub(x, pivot.At(d, k * kLanes))));
     });
-    double totals[C] = {};
-    AddByChannel<C>(sum, totals, 1);
+    double totals[C];
+    differences.ByChannel(totals);
     for (std::size_t c = 0; c < C; ++c) {
       means[c] = window[c] + static_cast<float>(totals[c] / static_cast<double>(shape.pixels()));
     }
@@ -540,39 +794,36 @@ void ChannelMeans(const float* window, const window_shape& shape, float* means) 
 
 void CentredSquares(const float* x, const float* x_means, const window_shape& shape, double* xx) {
   const Lanes d;
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
-    Vector mean[C], square[C];
-    SpreadChannels<C>(x_means, mean);
-    for (auto& s : square) s = hn::Zero(d);
-    ForEachVector<C>(shape.samples(), [&](std::size_t i, std::size_t k, auto keep) HWY_ATTR {
-      const auto e = keep(hn::Sub(hn::LoadU(d, x + i), mean[k]));
-      square[k] = hn::MulAdd(e, e, square[k]);
+    PerSample<C> mean;
+    mean.SpreadChannels(x_means);
+    RowSums<C> square;
+    ForEachVector<C>(shape, [&](std::size_t at, auto k, auto keep) WINDOW_LAMBDA {
+      const auto e = keep(hn::Sub(hn::LoadU(d, x + at), mean.At(d, k * kLanes)));
+      square.sum[k] = hn::MulAdd(e, e, square.sum[k]);
     });
-    std::fill_n(xx, C, 0.0);
-    AddByChannel<C>(square, xx, 1);
+    square.ByChannel(xx);
   });
 }
 
 void CentredProducts(const float* x, const float* x_means, const float* y, const float* y_means,
                      const window_shape& shape, double* xy, double* yy) {
   const Lanes d;
-  WithChannels(shape.channels, [&](auto channels) HWY_ATTR {
+  WithChannels(shape.channels, [&](auto channels) WINDOW_LAMBDA {
     constexpr std::size_t C = decltype(channels)::value;
-    Vector x_mean[C], y_mean[C], product[C], square[C];
-    SpreadChannels<C>(x_means, x_mean);
-    SpreadChannels<C>(y_means, y_mean);
-    for (std::size_t k = 0; k < C; ++k) product[k] = square[k] = hn::Zero(d);
-    ForEachVector<C>(shape.samples(), [&](std::size_t i, std::size_t k, auto keep) HWY_ATTR {
-      const auto e = hn::Sub(hn::LoadU(d, x + i), x_mean[k]);
-      const auto f = keep(hn::Sub(hn::LoadU(d, y + i), y_mean[k]));
-      product[k] = hn::MulAdd(e, f, product[k]);
-      square[k] = hn::MulAdd(f, f, square[k]);
+    PerSample<C> x_mean, y_mean;
+    x_mean.SpreadChannels(x_means);
+    y_mean.SpreadChannels(y_means);
+    RowSums<C> product, square;
+    ForEachVector<C>(shape, [&](std::size_t at, auto k, auto keep) WINDOW_LAMBDA {
+      const auto e = keep(hn::Sub(hn::LoadU(d, x + at), x_mean.At(d, k * kLanes)));
+      const auto f = keep(hn::Sub(hn::LoadU(d, y + at), y_mean.At(d, k * kLanes)));
+      product.sum[k] = hn::MulAdd(e, f, product.sum[k]);
+      square.sum[k] = hn::MulAdd(f, f, square.sum[k]);
     });
-    std::fill_n(xy, C, 0.0);
-    std::fill_n(yy, C, 0.0);
-    AddByChannel<C>(product, xy, 1);
-    AddByChannel<C>(square, yy, 1);
+    product.ByChannel(xy);
+    square.ByChannel(yy);
   });
 }
 
@@ -584,13 +835,13 @@ namespace marrow::tracking {
 
 HWY_EXPORT(SampleTranslatedFloats);
 HWY_EXPORT(SampleTranslatedBytes);
-HWY_EXPORT(SplitGradients);
 HWY_EXPORT(AffineWindowInside);
 HWY_EXPORT(SampleAffineFloats);
 HWY_EXPORT(SampleAffineBytes);
-HWY_EXPORT(GradientProducts);
-HWY_EXPORT(TranslationResidual);
+HWY_EXPORT(TranslationResidualFloats);
+HWY_EXPORT(TranslationResidualBytes);
 HWY_EXPORT(AffineResidual);
+HWY_EXPORT(GradientProducts);
 HWY_EXPORT(TemplateProducts);
 HWY_EXPORT(ChannelEnergies);
 HWY_EXPORT(ChannelMeans);
@@ -600,21 +851,17 @@ HWY_EXPORT(CentredProducts);
 namespace kernels {
 
 void SampleTranslated(const float* image, std::size_t image_width, std::size_t channels,
-                      std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                      std::size_t rows, float* out) {
+                      const translated_sampling& place, std::size_t columns, std::size_t rows,
+                      float* out, std::size_t out_stride) {
   HWY_DYNAMIC_DISPATCH(SampleTranslatedFloats)
-  (image, image_width, channels, x, y, fx, fy, columns, rows, out);
+  (image, image_width, channels, place, columns, rows, out, out_stride);
 }
 
 void SampleTranslated(const std::uint8_t* image, std::size_t image_width, std::size_t channels,
-                      std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                      std::size_t rows, float* out) {
+                      const translated_sampling& place, std::size_t columns, std::size_t rows,
+                      float* out, std::size_t out_stride) {
   HWY_DYNAMIC_DISPATCH(SampleTranslatedBytes)
-  (image, image_width, channels, x, y, fx, fy, columns, rows, out);
-}
-
-void SplitGradients(const float* block, const window_shape& shape, float* t, float* gx, float* gy) {
-  HWY_DYNAMIC_DISPATCH(SplitGradients)(block, shape, t, gx, gy);
+  (image, image_width, channels, place, columns, rows, out, out_stride);
 }
 
 bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
@@ -632,24 +879,31 @@ void SampleAffine(const std::uint8_t* image, std::size_t image_width, std::size_
   HWY_DYNAMIC_DISPATCH(SampleAffineBytes)(image, image_width, image_height, warp, shape, out);
 }
 
-void GradientProducts(const template_planes& level, const window_shape& shape, double sums[3]) {
-  HWY_DYNAMIC_DISPATCH(GradientProducts)(level, shape, sums);
+void TranslationResidual(const float* t, const float* image, std::size_t image_width,
+                         std::size_t image_height, const translated_sampling& place,
+                         const window_shape& shape, const color_fit& color, double* sums) {
+  HWY_DYNAMIC_DISPATCH(TranslationResidualFloats)
+  (t, image, image_width, image_height, place, shape, color, sums);
 }
 
-void TranslationResidual(const template_planes& level, const float* window,
-                         const window_shape& shape, const color_fit& color, bool per_channel,
-                         double* sums) {
-  HWY_DYNAMIC_DISPATCH(TranslationResidual)(level, window, shape, color, per_channel, sums);
+void TranslationResidual(const float* t, const std::uint8_t* image, std::size_t image_width,
+                         std::size_t image_height, const translated_sampling& place,
+                         const window_shape& shape, const color_fit& color, double* sums) {
+  HWY_DYNAMIC_DISPATCH(TranslationResidualBytes)
+  (t, image, image_width, image_height, place, shape, color, sums);
 }
 
-void AffineResidual(const template_planes& level, const offset_planes& offsets, const float* window,
-                    const window_shape& shape, const color_fit& color, double* sums) {
-  HWY_DYNAMIC_DISPATCH(AffineResidual)(level, offsets, window, shape, color, sums);
+void AffineResidual(const float* t, const float* window, const window_shape& shape,
+                    const color_fit& color, double* sums) {
+  HWY_DYNAMIC_DISPATCH(AffineResidual)(t, window, shape, color, sums);
 }
 
-void TemplateProducts(const template_planes& level, const offset_planes& offsets,
-                      const window_shape& shape, template_products& products) {
-  HWY_DYNAMIC_DISPATCH(TemplateProducts)(level, offsets, shape, products);
+void GradientProducts(const float* t, const window_shape& shape, double sums[3]) {
+  HWY_DYNAMIC_DISPATCH(GradientProducts)(t, shape, sums);
+}
+
+void TemplateProducts(const float* t, const window_shape& shape, template_products& products) {
+  HWY_DYNAMIC_DISPATCH(TemplateProducts)(t, shape, products);
 }
 
 void ChannelEnergies(const float* t, const window_shape& shape, double* energies) {

@@ -4,13 +4,16 @@
 #include <cstdint>
 
 // The loops over a tracking window's samples, vectorized by Highway with the instruction set chosen
-// at run time. A window is a plane of interleaved samples, row after row without gaps, followed by
-// padding up to window_shape::plane_size() floats. Kernels read the padding of every plane: it must
-// be 0 in templates and gradients and finite in a sampled window. Sums run in 32-bit lanes and are
-// joined in double.
+// at run time. A window is a plane of interleaved samples; the pointer to it is to its first
+// sample, and its rows start window_shape::stride() floats apart. A template has a border of one
+// pixel, from which its gradients come, the central differences Gx(u, v) = T(u + 1, v) - T(u - 1,
+// v) and Gy likewise, not halved. Kernels read, and ignore, whatever else a plane holds,
+// which in a template has to be finite. Sums run in 32-bit lanes, sixteen of each channel whatever
+// the width of a vector, and are joined in double.
 namespace marrow::tracking {
 
 inline constexpr std::size_t kMaxChannels = 4;
+inline constexpr std::size_t kWindowLanes = 16;  // of the longest vector
 
 // (2 * half_x + 1) by (2 * half_y + 1) pixels of 1 to kMaxChannels interleaved samples.
 struct window_shape {
@@ -21,28 +24,27 @@ struct window_shape {
   std::size_t columns() const { return 2 * half_x + 1; }
   std::size_t rows() const { return 2 * half_y + 1; }
   std::size_t pixels() const { return columns() * rows(); }
-  std::size_t samples() const { return pixels() * channels; }
-  // Room for whole vectors of 16 lanes of each channel, and for one sample more.
-  std::size_t plane_size() const { return (pixels() + 16) / 16 * 16 * channels; }
-};
-
-// The planes of one level of a template: T and its central differences, which are not halved.
-struct template_planes {
-  const float* t;
-  const float* gx;
-  const float* gy;
-};
-
-// u and v of each sample of a window, in a plane each.
-struct offset_planes {
-  const float* u;
-  const float* v;
+  std::size_t row_samples() const { return columns() * channels; }
+  // Floats from row to row: a pixel of border on either side, in whole vectors.
+  std::size_t stride() const {
+    return (row_samples() + 2 * channels + kWindowLanes - 1) / kWindowLanes * kWindowLanes;
+  }
+  // Floats of a plane with its border, and those of them before the window's first sample. With
+  // the plane's start every row's start is aligned to a vector.
+  std::size_t plane_size() const { return (rows() + 2) * stride() + 2 * kWindowLanes; }
+  std::size_t plane_start() const { return stride() + kWindowLanes; }
 };
 
 // T = gain * I + bias for each channel; null stands for gain 1 and bias 0.
 struct color_fit {
   const float* gain = nullptr;
   const float* bias = nullptr;
+};
+
+// Where the first of a block of pixels lies: at (x + fx, y + fy), 0 <= f < 1.
+struct translated_sampling {
+  std::size_t x, y;
+  float fx, fy;
 };
 
 // The affine warp of a window's offsets: offset (u, v) lies at
@@ -65,48 +67,47 @@ struct template_products {
 
 namespace kernels {
 
-// Bilinear sample of columns x rows pixels whose first lies at (x + fx, y + fy), 0 <= f < 1. Reads
-// pixels x to x + columns and y to y + rows of the image, which must be inside it. Bytes give what
-// floats of their values give.
+// Bilinear sample of columns x rows pixels to rows `out_stride` floats apart. Reads pixels x to
+// x + columns and y to y + rows of the image, which must be inside it. Bytes give what floats of
+// their values give.
 void SampleTranslated(const float* image, std::size_t image_width, std::size_t channels,
-                      std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                      std::size_t rows, float* out);
+                      const translated_sampling& place, std::size_t columns, std::size_t rows,
+                      float* out, std::size_t out_stride);
 void SampleTranslated(const std::uint8_t* image, std::size_t image_width, std::size_t channels,
-                      std::size_t x, std::size_t y, float fx, float fy, std::size_t columns,
-                      std::size_t rows, float* out);
-
-// Splits a block of columns + 2 by rows + 2 pixels into its inner window and the central
-// differences (f(x + 1) - f(x - 1)). Padding of the three planes is not touched.
-void SplitGradients(const float* block, const window_shape& shape, float* t, float* gx, float* gy);
+                      const translated_sampling& place, std::size_t columns, std::size_t rows,
+                      float* out, std::size_t out_stride);
 
 // True if the four corners of the window, and with them all of it, have 0 < X < width - 1 and
 // 0 < Y < height - 1. False if a coefficient is not finite.
 bool AffineWindowInside(const affine_sampling& warp, const window_shape& shape,
                         std::size_t image_width, std::size_t image_height);
 
-// Bilinear sample at the warped offsets of a window for which AffineWindowInside holds. One sample
-// behind the window is set to 0.
+// Bilinear sample at the warped offsets of a window for which AffineWindowInside holds. Whole
+// vectors are written, up to the border of the next row.
 void SampleAffine(const float* image, std::size_t image_width, std::size_t image_height,
                   const affine_sampling& warp, const window_shape& shape, float* out);
 void SampleAffine(const std::uint8_t* image, std::size_t image_width, std::size_t image_height,
                   const affine_sampling& warp, const window_shape& shape, float* out);
 
-// sums = {S(gx gx), S(gx gy), S(gy gy)}.
-void GradientProducts(const template_planes& level, const window_shape& shape, double sums[3]);
-
-// With r = T - (gain I + bias): sums = {S(gx r), S(gy r)}; with per_channel set, followed by S(T r)
+// With r = T - (gain I + bias), I what SampleTranslated gives for the window at `place`, which goes
+// no further than into registers: sums = {S(gx r), S(gy r)}, with a color fit followed by S(T r)
 // and S(r) of each channel.
-void TranslationResidual(const template_planes& level, const float* window,
-                         const window_shape& shape, const color_fit& color, bool per_channel,
-                         double* sums);
+void TranslationResidual(const float* t, const float* image, std::size_t image_width,
+                         std::size_t image_height, const translated_sampling& place,
+                         const window_shape& shape, const color_fit& color, double* sums);
+void TranslationResidual(const float* t, const std::uint8_t* image, std::size_t image_width,
+                         std::size_t image_height, const translated_sampling& place,
+                         const window_shape& shape, const color_fit& color, double* sums);
 
-// As above for the affine Jacobian: {S(gx r), S(gy r), S(u gx r), S(v gx r), S(u gy r), S(v gy r)},
-// with a color fit followed by S(T r) and S(r) of each channel.
-void AffineResidual(const template_planes& level, const offset_planes& offsets, const float* window,
-                    const window_shape& shape, const color_fit& color, double* sums);
+// As above for the affine Jacobian, of a window that was sampled before: {S(gx r), S(gy r),
+// S(u gx r), S(v gx r), S(u gy r), S(v gy r)}, and the same with a color fit.
+void AffineResidual(const float* t, const float* window, const window_shape& shape,
+                    const color_fit& color, double* sums);
 
-void TemplateProducts(const template_planes& level, const offset_planes& offsets,
-                      const window_shape& shape, template_products& products);
+// sums = {S(gx gx), S(gx gy), S(gy gy)}.
+void GradientProducts(const float* t, const window_shape& shape, double sums[3]);
+
+void TemplateProducts(const float* t, const window_shape& shape, template_products& products);
 
 // S(t t) of each channel.
 void ChannelEnergies(const float* t, const window_shape& shape, double* energies);

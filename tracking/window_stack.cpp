@@ -25,11 +25,7 @@ bool TemplateFits(float x, float y, const window_shape& shape, std::size_t width
 
 WindowStack::WindowStack(std::size_t half_x, std::size_t half_y, std::size_t channels,
                          std::size_t levels)
-    : shape{half_x, half_y, channels}, data(3 * levels * shape.plane_size()) {}
-
-std::size_t WindowScratchSize(const window_shape& shape) {
-  return (shape.columns() + 2) * (shape.rows() + 2) * shape.channels;
-}
+    : shape{half_x, half_y, channels}, planes(levels * shape.plane_size() / kWindowLanes) {}
 
 std::size_t CountWindowLevels(std::size_t levels, float x, float y, const window_shape& shape,
                               const ImagePyramid& pyramid) {
@@ -44,29 +40,28 @@ std::size_t CountWindowLevels(std::size_t levels, float x, float y, const window
 }
 
 void ExtractWindowLevel(std::size_t level, float x, float y, const ImagePyramid& pyramid,
-                        WindowStack& stack, float* scratch) {
+                        WindowStack& stack) {
   const window_shape& shape = stack.shape;
   x *= LevelScale(level);
   y *= LevelScale(level);
   const float ix = std::floor(x);
   const float iy = std::floor(y);
   const level_image image = pyramid.Level(level);
+  const translated_sampling place = {static_cast<std::size_t>(ix) - shape.half_x - 1,
+                                     static_cast<std::size_t>(iy) - shape.half_y - 1, x - ix,
+                                     y - iy};
   image.WithSamples([&](const auto* samples) {
-    kernels::SampleTranslated(samples, image.width, shape.channels,
-                              static_cast<std::size_t>(ix) - shape.half_x - 1,
-                              static_cast<std::size_t>(iy) - shape.half_y - 1, x - ix, y - iy,
-                              shape.columns() + 2, shape.rows() + 2, scratch);
+    kernels::SampleTranslated(samples, image.width, shape.channels, place, shape.columns() + 2,
+                              shape.rows() + 2,
+                              stack.Level(level) - shape.stride() - shape.channels, shape.stride());
   });
-  const std::size_t plane = shape.plane_size();
-  float* t = stack.data.data() + 3 * level * plane;
-  kernels::SplitGradients(scratch, shape, t, t + plane, t + 2 * plane);
 }
 
 std::size_t ExtractWindowStack(std::size_t levels, float x, float y, const ImagePyramid& pyramid,
-                               WindowStack& stack, float* scratch) {
+                               WindowStack& stack) {
   stack.levels_built = CountWindowLevels(levels, x, y, stack.shape, pyramid);
   for (std::size_t l = 0; l < stack.levels_built; ++l) {
-    ExtractWindowLevel(l, x, y, pyramid, stack, scratch);
+    ExtractWindowLevel(l, x, y, pyramid, stack);
   }
   return stack.levels_built;
 }

@@ -8,27 +8,30 @@
 
 namespace marrow::tracking {
 
-// The template of one feature: on each pyramid level the window around it and the window's
-// gradients. The three planes of a level follow one another, each of shape.plane_size() floats:
-// T, Gx(u, v) = B(u + 1, v) - B(u - 1, v) and Gy likewise, interleaved by channel, behind them
-// zeroes.
+// The template of one feature: on each pyramid level the window around it with its border, a plane
+// of shape.plane_size() floats. What the planes hold beside these is 0.
 struct WindowStack {
   WindowStack() = default;
   WindowStack(std::size_t half_x, std::size_t half_y, std::size_t channels, std::size_t levels);
 
-  template_planes Level(std::size_t level) const {
-    const std::size_t plane = shape.plane_size();
-    const float* t = data.data() + 3 * level * plane;
-    return {t, t + plane, t + 2 * plane};
+  // The window's first sample.
+  float* Level(std::size_t level) {
+    return reinterpret_cast<float*>(planes.data()) + level * shape.plane_size() +
+           shape.plane_start();
   }
+  const float* Level(std::size_t level) const {
+    return reinterpret_cast<const float*>(planes.data()) + level * shape.plane_size() +
+           shape.plane_start();
+  }
+
+  struct alignas(4 * kWindowLanes) aligned_lanes {
+    float lanes[kWindowLanes];
+  };
 
   window_shape shape;
   std::size_t levels_built = 0;
-  std::vector<float> data;
+  std::vector<aligned_lanes> planes;
 };
-
-// Floats of scratch that ExtractWindowLevel needs.
-std::size_t WindowScratchSize(const window_shape& shape);
 
 // On how many of the first `levels` levels of the pyramid a template around (x, y) fits. With ix,
 // iy the whole part of the position on the level, it needs half_x + 1 <= ix <= w - half_x - 3 and
@@ -38,11 +41,11 @@ std::size_t CountWindowLevels(std::size_t levels, float x, float y, const window
 
 // Samples one level, on which the template must fit.
 void ExtractWindowLevel(std::size_t level, float x, float y, const ImagePyramid& pyramid,
-                        WindowStack& stack, float* scratch);
+                        WindowStack& stack);
 
 // Samples every level on which the template around (x, y), pixels of level 0, fits; the first on
 // which it does not fit ends it. Returns and stores the number of levels.
 std::size_t ExtractWindowStack(std::size_t levels, float x, float y, const ImagePyramid& pyramid,
-                               WindowStack& stack, float* scratch);
+                               WindowStack& stack);
 
 }  // namespace marrow::tracking

@@ -45,11 +45,11 @@ struct Result {
 Result Solve(Template& t, const ImagePyramid& image, color_mode mode, int max_iterations = 25,
              AffineState start = {kX, kY}) {
   packed_cholesky normal;
-  if (!PrepareAffine(t.planes(), t.offsets(), t.shape(), mode == color_mode::joint, normal)) {
+  if (!PrepareAffine(t.plane(), t.shape(), mode == color_mode::joint, normal)) {
     return {-2, start};
   }
-  const int k = SolveAffine(t.planes(), t.offsets(), t.shape(), normal, Level0(image), mode,
-                            kTolerances, max_iterations, start, t.window.data());
+  const int k = SolveAffine(t.plane(), t.shape(), normal, Level0(image), mode, kTolerances,
+                            max_iterations, start, t.window());
   return {k, start};
 }
 
@@ -66,7 +66,7 @@ TEST(AffineSolverTest, AffineMotionWithGainAndBias) {
   EXPECT_NEAR(state.d, -0.0222, 1e-4);
   EXPECT_NEAR(state.gain[0], 1.1111, 1e-3);
   EXPECT_NEAR(state.bias[0], -11.28, 2e-2);
-  EXPECT_GT(NormalisedCorrelation(t.shape(), t.planes().t, t.window.data()), 0.9999f);
+  EXPECT_GT(NormalisedCorrelation(t.shape(), t.plane(), t.window()), 0.9999f);
   EXPECT_EQ(Solve(t, warped, color_mode::joint, 2).iterations, 2) << "the limit, not convergence";
 }
 
@@ -152,7 +152,7 @@ TEST(AffineSolverTest, WindowsThatDoNotTellTheMotionAreSingular) {
     const ImagePyramid image = Picture(96, 80, 3, 1, value);
     Template t(image, 7, kX, kY);
     packed_cholesky normal;
-    return !PrepareAffine(t.planes(), t.offsets(), t.shape(), color, normal);
+    return !PrepareAffine(t.plane(), t.shape(), color, normal);
   };
   for (const bool color : {false, true}) {
     EXPECT_TRUE(singular([](double, double, double) { return 77.0; }, color));

@@ -8,11 +8,11 @@
 namespace marrow::tracking {
 namespace {
 
-// Windows of three by one pixels, padded.
+// Windows of three by one pixels, in planes that hold other things too.
 constexpr std::size_t kPixels = 3;
 std::vector<float> Window(std::vector<std::vector<float>> channels) {
   const window_shape shape{1, 0, channels.size()};
-  std::vector<float> window(shape.plane_size());
+  std::vector<float> window(shape.plane_size(), 99.0f);
   for (std::size_t c = 0; c < channels.size(); ++c) {
     for (std::size_t i = 0; i < kPixels; ++i) window[i * channels.size() + c] = channels[c][i];
   }

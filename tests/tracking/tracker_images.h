@@ -40,29 +40,39 @@ inline level_image Level0(const ImagePyramid& pyramid) {
   return pyramid.Level(0);
 }
 
-// A template around a point of level 0, with all that the solvers want beside it.
+// A template around a point of level 0, and room for a sample.
 struct Template {
   Template(const ImagePyramid& pyramid, std::size_t half, float anchor_x, float anchor_y)
-      : x(anchor_x), y(anchor_y), stack(half, half, pyramid.channels, pyramid.levels) {
-    std::vector<float> scratch(WindowScratchSize(stack.shape));
-    ExtractWindowStack(pyramid.levels, x, y, pyramid, stack, scratch.data());
-    window.resize(stack.shape.plane_size());
-    u.resize(window.size());
-    v.resize(window.size());
-    const int columns = static_cast<int>(stack.shape.columns());
-    const int channels = static_cast<int>(pyramid.channels);
-    for (int i = 0; i < static_cast<int>(stack.shape.samples()); ++i) {
-      u[i] = static_cast<float>(i / channels % columns - static_cast<int>(half));
-      v[i] = static_cast<float>(i / channels / columns - static_cast<int>(half));
-    }
+      : x(anchor_x),
+        y(anchor_y),
+        stack(half, half, pyramid.channels, pyramid.levels),
+        sample(half, half, pyramid.channels, 1) {
+    ExtractWindowStack(pyramid.levels, x, y, pyramid, stack);
   }
   const window_shape& shape() const { return stack.shape; }
-  template_planes planes() const { return stack.Level(0); }
-  offset_planes offsets() const { return {u.data(), v.data()}; }
+  const float* plane() const { return stack.Level(0); }
+  float* window() { return sample.Level(0); }
+  const float* window() const { return sample.Level(0); }
 
   float x, y;
-  WindowStack stack;
-  std::vector<float> u, v, window;
+  WindowStack stack, sample;
+};
+
+// One sample of a window, with its place and the gradients of a template.
+struct Sample {
+  Sample(const window_shape& shape, const float* plane, std::size_t i)
+      : c(i % shape.channels),
+        u(static_cast<double>(i / shape.channels % shape.columns()) - shape.half_x),
+        v(static_cast<double>(i / shape.channels / shape.columns()) - shape.half_y),
+        at(i / shape.row_samples() * shape.stride() + i % shape.row_samples()),
+        value(plane[at]),
+        gx(plane[at + shape.channels] - plane[static_cast<std::ptrdiff_t>(at - shape.channels)]),
+        gy(plane[at + shape.stride()] - plane[static_cast<std::ptrdiff_t>(at - shape.stride())]) {}
+
+  std::size_t c;
+  double u, v;
+  std::size_t at;  // in the plane
+  double value, gx, gy;
 };
 
 // The Gauss-Newton step by plain loops: least squares of J step = T - (gain I + bias) over the
@@ -73,18 +83,18 @@ inline std::vector<double> PlainStep(const Template& t, const AffineState& state
   const std::size_t channels = t.shape().channels;
   const std::size_t rows = motion + (color ? 2 * channels : 0);
   std::vector<std::vector<double>> h(rows, std::vector<double>(rows + 1));
-  for (std::size_t i = 0; i < t.shape().samples(); ++i) {
-    const std::size_t c = i % channels;
-    const double gx = 0.5 * t.planes().gx[i], gy = 0.5 * t.planes().gy[i];
-    const double all[] = {gx, gy, t.u[i] * gx, t.v[i] * gx, t.u[i] * gy, t.v[i] * gy};
+  for (std::size_t i = 0; i < t.shape().pixels() * channels; ++i) {
+    const Sample s(t.shape(), t.plane(), i);
+    const double gx = 0.5 * s.gx, gy = 0.5 * s.gy;
+    const double all[] = {gx, gy, s.u * gx, s.v * gx, s.u * gy, s.v * gy};
     std::vector<double> j(all, all + motion);
     j.resize(rows);
     if (color) {
-      j[motion + 2 * c] = t.planes().t[i];
-      j[motion + 2 * c + 1] = 1;
+      j[motion + 2 * s.c] = s.value;
+      j[motion + 2 * s.c + 1] = 1;
     }
-    const double gain = color ? state.gain[c] : 1, bias = color ? state.bias[c] : 0;
-    const double r = t.planes().t[i] - (gain * t.window[i] + bias);
+    const double gain = color ? state.gain[s.c] : 1, bias = color ? state.bias[s.c] : 0;
+    const double r = s.value - (gain * t.window()[s.at] + bias);
     for (std::size_t a = 0; a < rows; ++a) {
       for (std::size_t b = 0; b < rows; ++b) h[a][b] += j[a] * j[b];
       h[a][rows] += j[a] * r;

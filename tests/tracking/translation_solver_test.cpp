@@ -15,6 +15,7 @@ using testing::Level0;
 using testing::Pattern;
 using testing::Picture;
 using testing::PlainStep;
+using testing::Sample;
 using testing::Template;
 
 constexpr solver_tolerances kTolerances{0.1f, 0.05f, 0.05f, 1.0f};
@@ -41,9 +42,9 @@ Result Solve(Template& t, const ImagePyramid& image, color_mode mode, int max_it
              AffineState start = {40.25f, 36.5f},
              const solver_tolerances& tolerances = kTolerances) {
   translation_normal normal;
-  if (!PrepareTranslation(t.planes(), t.offsets(), t.shape(), mode, normal)) return {-2, start};
-  const int k = SolveTranslation(t.planes(), t.shape(), normal, Level0(image), mode, tolerances,
-                                 max_iterations, start, t.window.data());
+  if (!PrepareTranslation(t.plane(), t.shape(), mode, normal)) return {-2, start};
+  const int k = SolveTranslation(t.plane(), t.shape(), normal, Level0(image), mode, tolerances,
+                                 max_iterations, start, t.window());
   return {k, start};
 }
 
@@ -107,18 +108,20 @@ TEST(TranslationSolverTest, AStepIsTheLeastSquaresStep) {
   const Result regressed = Solve(t, moved, color_mode::regressed, 1, start);
   for (int c = 0; c < 3; ++c) {
     double n = 0, i = 0, ii = 0, tt = 0, it = 0;
-    for (std::size_t k = c; k < t.shape().samples(); k += 3) {
-      const double sample = t.window[k], wanted = t.planes().t[k];
+    for (std::size_t k = c; k < 3 * t.shape().pixels(); k += 3) {
+      const Sample s(t.shape(), t.plane(), k);
+      const double sample = t.window()[s.at], wanted = s.value;
       n += 1, i += sample, ii += sample * sample, tt += wanted, it += sample * wanted;
     }
     EXPECT_NEAR(regressed.state.gain[c], (n * it - i * tt) / (n * ii - i * i), 1e-5);
     EXPECT_NEAR(regressed.state.bias[c], (ii * tt - it * i) / (n * ii - i * i), 1e-3);
   }
   double xx = 0, xy = 0, yy = 0, bx = 0, by = 0;
-  for (std::size_t k = 0; k < t.shape().samples(); ++k) {
-    const double gx = t.planes().gx[k] / 2, gy = t.planes().gy[k] / 2;
-    const double r = t.planes().t[k] - (1.0 * regressed.state.gain[k % 3] * t.window[k] +
-                                        regressed.state.bias[k % 3]);
+  for (std::size_t k = 0; k < 3 * t.shape().pixels(); ++k) {
+    const Sample s(t.shape(), t.plane(), k);
+    const double gx = s.gx / 2, gy = s.gy / 2;
+    const double r =
+        s.value - (1.0 * regressed.state.gain[s.c] * t.window()[s.at] + regressed.state.bias[s.c]);
     xx += gx * gx, xy += gx * gy, yy += gy * gy, bx += gx * r, by += gy * r;
   }
   const double determinant = xx * yy - xy * xy;
@@ -164,7 +167,7 @@ TEST(TranslationSolverTest, FlatWindowsFail) {
   const ImagePyramid flat = Picture(96, 80, 3, 1, [](double, double, double) { return 77.0; });
   Template t(flat, 7, 40.25f, 36.5f);
   translation_normal normal;
-  EXPECT_FALSE(PrepareTranslation(t.planes(), t.offsets(), t.shape(), color_mode::joint, normal));
+  EXPECT_FALSE(PrepareTranslation(t.plane(), t.shape(), color_mode::joint, normal));
   const ImagePyramid base = Base();
   for (const color_mode mode : {color_mode::none, color_mode::regressed}) {
     EXPECT_EQ(Solve(t, base, mode).iterations, kLevelFailed);

@@ -12,6 +12,7 @@ namespace {
 
 using testing::kNaN;
 using testing::Picture;
+using testing::Sample;
 
 TEST(WindowStackTest, LimitsOfAWindowOf31DifferByOneBetweenTheAxes) {
   const ImagePyramid pyramid(1920, 1080, 3, 5);
@@ -56,22 +57,18 @@ TEST(WindowStackTest, PlanesOfEveryLevelShowTheWindowAndItsDifferences) {
     return x * y / 64 + 2 * x - c * y + 10 * c;
   });
   WindowStack stack(2, 2, 3, 3);
-  std::vector<float> scratch(WindowScratchSize(stack.shape), kNaN);
-  std::fill(stack.data.begin(), stack.data.end(), 0.0f);
   const float x = 70.3f, y = 61.7f;
-  ASSERT_EQ(ExtractWindowStack(3, x, y, pyramid, stack, scratch.data()), 3u);
+  ASSERT_EQ(ExtractWindowStack(3, x, y, pyramid, stack), 3u);
   ASSERT_EQ(stack.levels_built, 3u);
   for (int level = 0; level < 3; ++level) {
     const double step = 1 << level;  // level-0 pixels to a pixel of the level
-    const template_planes planes = stack.Level(level);
     for (int i = 0; i < 75; ++i) {
-      const int c = i % 3;
-      const double px = x + step * (i / 3 % 5 - 2), py = y + step * (i / 15 - 2);
-      ASSERT_NEAR(planes.t[i], px * py / 64 + 2 * px - c * py + 10 * c, 2e-3) << level << " " << i;
-      ASSERT_NEAR(planes.gx[i], 2 * step * (py / 64 + 2), 2e-3) << level << " " << i;
-      ASSERT_NEAR(planes.gy[i], 2 * step * (px / 64 - c), 2e-3) << level << " " << i;
+      const Sample s(stack.shape, stack.Level(level), i);
+      const double px = x + step * s.u, py = y + step * s.v, c = s.c;
+      ASSERT_NEAR(s.value, px * py / 64 + 2 * px - c * py + 10 * c, 2e-3) << level << " " << i;
+      ASSERT_NEAR(s.gx, 2 * step * (py / 64 + 2), 2e-3) << level << " " << i;
+      ASSERT_NEAR(s.gy, 2 * step * (px / 64 - c), 2e-3) << level << " " << i;
     }
-    for (std::size_t i = 75; i < stack.shape.plane_size(); ++i) ASSERT_EQ(planes.gy[i], 0.0f);
   }
 }
 
@@ -79,21 +76,21 @@ TEST(WindowStackTest, ExtractionAtTheLimitsStaysInsideTheImage) {
   const auto value = [](double x, double y, double) { return 3 * x + 5 * y; };
   const ImagePyramid pyramid = Picture(24, 22, 1, 1, value);
   WindowStack stack(3, 3, 1, 1);
-  std::vector<float> scratch(WindowScratchSize(stack.shape));
   for (const float x : {4.0f, 18.875f}) {
     for (const float y : {4.0f, 15.875f}) {
-      ASSERT_EQ(ExtractWindowStack(1, x, y, pyramid, stack, scratch.data()), 1u);
+      ASSERT_EQ(ExtractWindowStack(1, x, y, pyramid, stack), 1u);
       for (int i = 0; i < 49; ++i) {
-        ASSERT_FLOAT_EQ(stack.Level(0).t[i], value(x + i % 7 - 3, y + i / 7 - 3, 0));
-        ASSERT_EQ(stack.Level(0).gx[i], 6.0f);
-        ASSERT_EQ(stack.Level(0).gy[i], 10.0f);
+        const Sample s(stack.shape, stack.Level(0), i);
+        ASSERT_FLOAT_EQ(s.value, value(x + s.u, y + s.v, 0));
+        ASSERT_EQ(s.gx, 6.0f);
+        ASSERT_EQ(s.gy, 10.0f);
       }
     }
   }
-  const std::vector<float> before = stack.data;
-  EXPECT_EQ(ExtractWindowStack(1, 3.9f, 9, pyramid, stack, scratch.data()), 0u);
+  const std::vector<float> before(stack.Level(0), stack.Level(0) + 7 * stack.shape.stride());
+  EXPECT_EQ(ExtractWindowStack(1, 3.9f, 9, pyramid, stack), 0u);
   EXPECT_EQ(stack.levels_built, 0u);
-  EXPECT_EQ(stack.data, before);
+  EXPECT_TRUE(std::equal(before.begin(), before.end(), stack.Level(0)));
 }
 
 }  // namespace
