@@ -14,9 +14,14 @@
 // After foreach_target.
 #include <hwy/highway.h>
 
-// Of a lambda in a kernel: it has to be part of the loop around it.
+// Of a lambda in a kernel: it has to be part of the loop around it, but where a sanitizer watches
+// every access that makes functions which compile for minutes.
 #ifndef WINDOW_LAMBDA
+#if HWY_IS_ASAN || HWY_IS_TSAN
+#define WINDOW_LAMBDA HWY_ATTR
+#else
 #define WINDOW_LAMBDA HWY_ATTR __attribute__((always_inline))
+#endif
 #endif
 
 HWY_BEFORE_NAMESPACE();

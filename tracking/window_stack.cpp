@@ -25,7 +25,7 @@ bool TemplateFits(float x, float y, const window_shape& shape, std::size_t width
 
 WindowStack::WindowStack(std::size_t half_x, std::size_t half_y, std::size_t channels,
                          std::size_t levels)
-    : shape{half_x, half_y, channels}, planes(levels * shape.plane_size() / kWindowLanes) {}
+    : shape{half_x, half_y, channels}, planes(levels * shape.plane_size()) {}
 
 std::size_t CountWindowLevels(std::size_t levels, float x, float y, const window_shape& shape,
                               const ImagePyramid& pyramid) {

@@ -1,8 +1,8 @@
 #pragma once
 
 #include <cstddef>
-#include <vector>
 
+#include "platform/memory/line_aligned.h"
 #include "tracking/image_pyramid.h"
 #include "tracking/window_kernels.h"
 
@@ -16,21 +16,15 @@ struct WindowStack {
 
   // The window's first sample.
   float* Level(std::size_t level) {
-    return reinterpret_cast<float*>(planes.data()) + level * shape.plane_size() +
-           shape.plane_start();
+    return planes.data() + level * shape.plane_size() + shape.plane_start();
   }
   const float* Level(std::size_t level) const {
-    return reinterpret_cast<const float*>(planes.data()) + level * shape.plane_size() +
-           shape.plane_start();
+    return planes.data() + level * shape.plane_size() + shape.plane_start();
   }
-
-  struct alignas(4 * kWindowLanes) aligned_lanes {
-    float lanes[kWindowLanes];
-  };
 
   window_shape shape;
   std::size_t levels_built = 0;
-  std::vector<aligned_lanes> planes;
+  memory::LineAlignedVector<float> planes;
 };
 
 // On how many of the first `levels` levels of the pyramid a template around (x, y) fits. With ix,
