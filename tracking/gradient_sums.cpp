@@ -35,6 +35,11 @@ HWY_INLINE Matrix AddByMultiplier(const Matrix& a, const Matrix& b) {
           AddByMultiplier(d, a.xy, b.xy)};
 }
 
+HWY_INLINE Matrix Zeroes() {
+  const Floats d;
+  return {hn::Zero(d), hn::Zero(d), hn::Zero(d)};
+}
+
 HWY_INLINE Matrix LoadMatrix(const float* planes, std::size_t stride) {
   const Floats d;
   return {hn::LoadU(d, planes), hn::LoadU(d, planes + stride), hn::LoadU(d, planes + 2 * stride)};
@@ -82,7 +87,8 @@ HWY_INLINE void SumColumnWindows(const column_window& w) {
   // The last window's, and a group at least, which the windows to come hold as a whole.
   constexpr std::size_t kEntering = std::max(kGroup, kRest + kGroup - 1);
   for (std::size_t i = 0; i < w.count; i += hn::Lanes(Floats())) {
-    Matrix windows[kGroup], group, start, whole;
+    // Zeroes that compilers ask for: each is set before it is read.
+    Matrix windows[kGroup], group = Zeroes(), start = Zeroes(), whole = Zeroes();
     if (w.ends) {
       whole = LoadMatrix(w.ends + i, w.group_stride);
       if (w.block_start) {
