@@ -5,7 +5,7 @@
 #include <iostream>
 
 #include "fuzz/state_input.h"
-#include "tests/state_format/sample_payload.h"
+#include "tests/stabilizer/effect/state_format/sample_payload.h"
 
 int main(int argc, char** argv) {
   using namespace kelp::effect;

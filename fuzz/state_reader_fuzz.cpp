@@ -11,7 +11,7 @@
 #include "stabilizer/effect/src/state_format/format.h"
 #include "stabilizer/effect/src/state_format/state_reader.h"
 #include "stabilizer/effect/src/state_format/state_writer.h"
-#include "tests/state_format/sample_payload.h"
+#include "tests/stabilizer/effect/state_format/sample_payload.h"
 
 namespace {
 

@@ -11,8 +11,8 @@
 
 // Between a file's frames and the host's pixels. Planar YUV goes to and from 8 bits by PlanarYuv;
 // for all else swscale brings chroma to full size and back (each field by itself in an interlaced
-// 4:2:0 frame, at the tagged chroma position). For 16 bits and floats the colour matrix is DeepYuv's,
-// since swscale's falls short of full white by 0.4 %.
+// 4:2:0 frame, at the tagged chroma position). For 16 bits and floats the colour matrix is
+// DeepYuv's, since swscale's falls short of full white by 0.4 %.
 namespace calmframe::media {
 
 // A swscale context that is made again when its frames change.

@@ -15,7 +15,7 @@
 #include <vector>
 
 #include "examples/outside_renderer/comparison.h"
-#include "tests/host/tour/played_plugin.h"
+#include "tests/contract/played_plugin.h"
 #include "tests/support/drawn_clip.h"
 #include "tests/support/scratch_folder.h"
 

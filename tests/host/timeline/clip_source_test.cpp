@@ -1,8 +1,8 @@
 #include <fstream>
 #include <thread>
 
+#include "tests/host/media/clip_fixture.h"
 #include "tests/host/timeline/timeline_fixture.h"
-#include "tests/media/clip_fixture.h"
 
 namespace calmframe::host {
 namespace {

@@ -1,0 +1,247 @@
+// Sound clips that are unlike most: each gives the frames, times and pixels that the ffmpeg program
+// decodes from it.
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+
+#include "host/media/frame_index.h"
+#include "tests/host/media/clip_fixture.h"
+
+namespace calmframe::media {
+namespace {
+
+class UnusualMediaTest : public ClipTest {
+ protected:
+  // Seconds of the frames, in the order shown.
+  static std::vector<double> TimesOf(const std::string& path) {
+    std::istringstream lines(Output(
+        "ffprobe -v error -select_streams V:0 -show_entries frame=best_effort_timestamp_time "
+        "-of csv=p=0 '" +
+        path + "'"));
+    std::vector<double> times;
+    for (std::string line; std::getline(lines, line);) {
+      if (!line.empty()) times.push_back(std::stod(line));
+    }
+    return times;
+  }
+
+  // Frames, times and pixels against those of the ffmpeg program.
+  void ExpectAsDecoded(const std::string& name) {
+    const auto reader = ClipReader::Open(In(name));
+    const ClipInfo& info = reader->info();
+    EXPECT_EQ(info.warning, "");
+    const std::vector<double> times = TimesOf(In(name));
+    ASSERT_EQ(info.frame_count, times.size());
+    const double tick = static_cast<double>(info.time_base.num) / info.time_base.den;
+    for (std::size_t i = 0; i < times.size(); ++i) {
+      EXPECT_NEAR(static_cast<double>(info.times[i].pts) * tick, times[i], 1e-5) << i;
+    }
+    // The program takes chroma as centred whatever the file says.
+    const std::string sited = info.codec == "mjpeg" ? "" : ":in_h_chr_pos=0";
+    Ffmpeg("-i " + In(name) +
+           " -map 0:V:0 -vsync passthrough -vf "
+           "scale=flags=bicubic+accurate_rnd+full_chroma_int+full_chroma_inp" +
+           sited + " -pix_fmt gbrap -f rawvideo " + In("decoded"));
+    const std::string decoded = Content("decoded");
+    const std::size_t plane = static_cast<std::size_t>(info.width) * info.height;
+    ASSERT_EQ(decoded.size(), 4 * plane * info.frame_count);
+    double worst = 0;
+    for (std::size_t i = info.frame_count; i-- > 0;) {
+      const auto pixels = ReadFrame<HX_Pixel8>(*reader, i);
+      const auto* green = reinterpret_cast<const std::uint8_t*>(decoded.data()) + 4 * plane * i;
+      int sum = 0;
+      for (std::size_t k = 0; k < plane; ++k) {
+        const HX_Pixel8& p = pixels[k];
+        sum += std::abs(p.green - green[k]) + std::abs(p.blue - green[k + plane]) +
+               std::abs(p.red - green[k + 2 * plane]) + std::abs(p.alpha - green[k + 3 * plane]);
+      }
+      worst = std::max(worst, sum / (4.0 * static_cast<double>(plane)));
+    }
+    EXPECT_LT(worst, 0.5);  // of 255, on average
+  }
+};
+
+TEST_F(UnusualMediaTest, FramesTimesAndPixelsAreTheFilesOwn) {
+  const std::string source = "-f lavfi -i testsrc=s=98x66:r=25:d=1,gblur=3 ";
+  const std::string sound = "-f lavfi -i sine=d=1 ";
+  const struct {
+    const char* name;
+    std::string make;
+    std::size_t frames;
+  } cases[] = {
+      {"one.mp4", source + "-frames:v 1 -c:v libx264", 1},
+      {"two.mp4", source + "-frames:v 2 -c:v libx264 -bf 2", 2},
+      {"three.mkv", source + "-frames:v 3 -c:v libx264 -bf 2", 3},
+      {"gaps.mkv", source + "-vf 'setpts=N+20*floor(N/4)' -vsync passthrough -c:v ffv1", 25},
+      {"vfr.mp4", source + "-vf select='mod(n\\,5)' -vsync vfr -c:v libx264", 20},
+      {"late.ts", source + "-c:v libx264 -bf 2 -output_ts_offset 5000", 25},
+      {"negative.nut", source + "-c:v mpeg4 -bsf:v setts=ts=TS-9", 25},
+      {"edited.mp4",
+       source + sound +
+           "-c:v libx264 -bf 2 -c:a aac whole.mp4 && ffmpeg -nostdin -v error -y "
+           "-ss 0.5 -i whole.mp4 -c copy",
+       12},
+      {"attached.mkv", source + "-c:v libx264 -attach cover.png -metadata:s:t mimetype=image/png",
+       25},
+      {"streams.mkv",
+       source + "-f lavfi -i color=s=32x32:d=1 " + sound +
+           "-map 2 -map 0 -map 1 -map 2 -c:v ffv1 -c:a flac -disposition:v:0 default",
+       25},
+      {"alpha.mov",
+       source + "-vf 'format=rgba,geq=r=r(X\\,Y):g=g(X\\,Y):b=b(X\\,Y):a=2*X' -frames:v 3 "
+                "-c:v qtrle",
+       3},
+      {"alpha.mkv",
+       source + "-vf 'format=yuva444p,geq=lum=lum(X\\,Y):cb=cb(X\\,Y):cr=cr(X\\,Y):a=2*X' "
+                "-frames:v 3 -c:v ffv1",
+       3},
+      {"alpha444.mov", source + "-frames:v 3 -c:v prores_ks -pix_fmt yuva444p10le", 3},
+      {"422.mov", source + "-frames:v 3 -c:v prores_ks -pix_fmt yuv422p10le", 3},
+      {"ten.mp4",
+       source + "-frames:v 3 -c:v libx265 -x265-params log-level=none -pix_fmt "
+                "yuv420p10le",
+       3},
+      {"open.mp4",
+       source + "-c:v libx265 -x265-params "
+                "log-level=none:keyint=6:open-gop=1:bframes=3",
+       25},
+      {"still.avi", source + "-frames:v 3 -c:v mjpeg -pix_fmt yuvj422p", 3},
+      {"vp9.webm", source + "-frames:v 5 -c:v libvpx-vp9 -deadline realtime -cpu-used 8", 5},
+      {"av1.mkv", source + "-frames:v 3 -c:v libaom-av1 -cpu-used 8 -usage realtime", 3},
+      {"palette.gif", source + "-frames:v 4 -vf split[a][b],[a]palettegen[p],[b][p]paletteuse", 4},
+      {"grey.mkv", source + "-frames:v 3 -c:v ffv1 -pix_fmt gray", 3},
+      {"grey10.mkv", source + "-frames:v 3 -c:v ffv1 -pix_fmt gray10le", 3},
+      {"mono.nut", source + "-frames:v 3 -c:v rawvideo -pix_fmt monow", 3},
+      {"odd.mkv", "-f lavfi -i testsrc=s=97x65:r=25:d=0.2,gblur=3 -c:v ffv1 -pix_fmt yuv420p", 5},
+      {"411_96.mkv", source + "-frames:v 3 -vf scale=96:64 -c:v ffv1 -pix_fmt yuv411p", 3},
+      {"411.mkv", source + "-frames:v 3 -c:v ffv1 -pix_fmt yuv411p", 3},
+      {"full.mkv", source + "-frames:v 3 -vf scale=out_range=pc -color_range pc -c:v ffv1", 3},
+      {"2020.mkv",
+       source + "-frames:v 3 -vf scale=out_color_matrix=bt2020 -colorspace bt2020nc "
+                "-c:v ffv1 -pix_fmt yuv444p12le -strict -2",
+       3},
+      {"8k.mov", "-f lavfi -i testsrc2=s=7680x4320:r=1 -frames:v 3 -c:v mjpeg -q:v 9", 3},
+  };
+  Ffmpeg("-f lavfi -i color=red:s=32x32 -frames:v 1 " + In("cover.png"));
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    Output("cd '" + In("") + "' && ffmpeg -nostdin -y -v error " + c.make + " " + c.name);
+    ExpectAsDecoded(c.name);
+    EXPECT_EQ(ClipReader::Open(In(c.name))->info().frame_count, c.frames);
+    std::filesystem::remove(In(c.name));
+  }
+}
+
+TEST_F(UnusualMediaTest, EveryTurnAndMirrorImage) {
+  Ffmpeg("-f lavfi -i testsrc=s=64x32:r=25:d=0.1,setsar=2/1 -c:v libx264rgb -qp 0 " +
+         In("flat.mp4"));
+  const auto flat = ReadFrame<HX_Pixel8>(*ClipReader::Open(In("flat.mp4")), 1);
+  const std::string bytes = Content("flat.mp4");
+  const std::size_t matrix = bytes.find("tkhd") + 44;
+  for (const auto& [a, b, c, d] : {std::array{1, 0, 0, 1},
+                                   {0, 1, -1, 0},
+                                   {-1, 0, 0, -1},
+                                   {0, -1, 1, 0},
+                                   {-1, 0, 0, 1},
+                                   {1, 0, 0, -1},
+                                   {0, 1, 1, 0},
+                                   {0, -1, -1, 0}}) {
+    SCOPED_TRACE(::testing::PrintToString(std::array{a, b, c, d}));
+    std::string turned = bytes;
+    const int entries[] = {a, b, 0, c, d};  // 16.16, big-endian
+    for (std::size_t i = 0; i < 5; ++i) {
+      turned[matrix + 4 * i] = static_cast<char>(-(entries[i] < 0));
+      turned[matrix + 4 * i + 1] = static_cast<char>(entries[i]);
+      turned[matrix + 4 * i + 2] = turned[matrix + 4 * i + 3] = 0;
+    }
+    std::ofstream(In("turned.mp4"), std::ios::binary) << turned;
+    const auto reader = ClipReader::Open(In("turned.mp4"));
+    const int width = a != 0 ? 64 : 32;
+    ASSERT_EQ(reader->info().width, width);
+    const Ratio aspect = reader->info().pixel_aspect;
+    EXPECT_EQ(aspect.num * (a != 0 ? 1 : 2), aspect.den * (a != 0 ? 2 : 1));
+    const auto shown = ReadFrame<HX_Pixel8>(*reader, 1);
+    int wrong = 0;
+    for (int y = 0; y < 32; ++y) {
+      for (int x = 0; x < 64; ++x) {
+        // A stored point (x, y) is shown at (a x + c y, b x + d y), counted from the picture's
+        // edge.
+        const int to_x = a * x + c * y + (a < 0 ? 63 : 0) + (c < 0 ? 31 : 0);
+        const int to_y = b * x + d * y + (b < 0 ? 63 : 0) + (d < 0 ? 31 : 0);
+        wrong += std::memcmp(&shown[to_y * width + to_x], &flat[y * 64 + x], 4) != 0;
+      }
+    }
+    EXPECT_EQ(wrong, 0);
+  }
+  // The sense of the turn is the one that players take.
+  Ffmpeg("-i " + In("flat.mp4") + " -c copy -metadata:s:v rotate=90 " + In("turned.mp4"));
+  Ffmpeg("-i " + In("turned.mp4") + " -c:v ffv1 -pix_fmt bgr0 -metadata:s:v rotate=0 " +
+         In("shown.mkv"));
+  EXPECT_TRUE(SamePixels(ReadFrame<HX_Pixel8>(*ClipReader::Open(In("turned.mp4")), 1),
+                         ReadFrame<HX_Pixel8>(*ClipReader::Open(In("shown.mkv")), 1)));
+}
+
+TEST_F(UnusualMediaTest, FieldsInBothOrders) {
+  for (const bool top : {true, false}) {
+    Ffmpeg(std::string("-f lavfi -i testsrc2=s=64x64:r=50:d=0.4 -vf interlace=lowpass=off:scan=") +
+           (top ? "tff" : "bff") + " -c:v libx264 -flags +ilme+ildct -x264-params " +
+           (top ? "tff" : "bff") + "=1 " + In("i.ts"));
+    // Told by the frames alone.
+    EXPECT_EQ(ClipReader::Open(In("i.ts"))->info().field_order,
+              top ? FieldOrder::top_first : FieldOrder::bottom_first);
+    // Upside down, the other field's rows are on top.
+    Ffmpeg("-i " + In("i.ts") + " -c copy -metadata:s:v rotate=180 " + In("turned.mp4"));
+    EXPECT_EQ(ClipReader::Open(In("turned.mp4"))->info().field_order,
+              top ? FieldOrder::bottom_first : FieldOrder::top_first);
+  }
+}
+
+TEST_F(UnusualMediaTest, SizeThatChangesOnTheWayIsThatOfTheFirstFrame) {
+  Ffmpeg("-f lavfi -i testsrc=s=64x48:r=25:d=0.4 -c:v libx264 " + In("a.ts"));
+  Ffmpeg("-f lavfi -i testsrc=s=96x80:r=25:d=0.4 -c:v libx264 -pix_fmt yuv444p " + In("b.ts"));
+  std::ofstream(In("c.ts"), std::ios::binary) << Content("a.ts") << Content("b.ts");
+  const auto reader = ClipReader::Open(In("c.ts"));
+  ASSERT_EQ(reader->info().frame_count, 20u);
+  EXPECT_EQ(reader->info().width, 64);
+  const auto last = ReadFrame<HX_Pixel8>(*reader, 19);
+  Ffmpeg("-i " + In("b.ts") + " -vf scale=64:48:flags=bicubic -c:v ffv1 " + In("d.mkv"));
+  const auto expected = ReadFrame<HX_Pixel8>(*ClipReader::Open(In("d.mkv")), 9);
+  double sum = 0;
+  for (std::size_t i = 0; i < last.size(); ++i) sum += std::abs(last[i].green - expected[i].green);
+  EXPECT_LT(sum / static_cast<double>(last.size()), 4);
+}
+
+TEST_F(UnusualMediaTest, TimesBeyondAnyClockAreNone) {
+  for (const char* times : {"ts=9.2e18+4096*N", "ts=if(eq(N\\,2)\\,9.2e18\\,2048*N)",
+                            "pts=if(eq(N\\,2)\\,5e17\\,PTS)", "ts=-9.2e18+2048*N"}) {
+    SCOPED_TRACE(times);
+    Ffmpeg("-f lavfi -i testsrc2=s=64x48:r=25:d=0.2 -c:v mpeg4 -bsf:v \"setts=" +
+           std::string(times) + "\" " + In("far.nut"));
+    const ClipInfo info = ClipReader::Open(In("far.nut"))->info();
+    ASSERT_EQ(info.frame_count, 5u);
+    EXPECT_GT(info.frame_rate.num, 0);
+    EXPECT_GT(info.frame_rate.den, 0);
+    // A 25th of a second.
+    for (std::size_t i = 1; i < 5; ++i) EXPECT_EQ(info.times[i].pts - info.times[i - 1].pts, 2048);
+    EXPECT_LT(std::abs(info.times[4].pts), std::int64_t{1} << 61);
+  }
+}
+
+TEST_F(UnusualMediaTest, WhatIsTooMuchIsRefusedInOneLine) {
+  Ffmpeg("-f lavfi -i testsrc=s=64x48:r=25:d=0.4 -c:v mpeg4 " + In("many.avi"));
+  Decoder decoder(In("many.avi"));
+  ClipInfo info;
+  EXPECT_EQ(LineOf(Failure::Side::input, [&] { ScanFrames("many.avi", decoder, info, 9); }),
+            "many.avi: more than 9 frames");
+  Decoder again(In("many.avi"));
+  EXPECT_EQ(ScanFrames("many.avi", again, info = {}, 10).size(), 10u);
+
+  std::ofstream(In("huge.y4m")) << "YUV4MPEG2 W16000 H16000 F25:1 Ip A1:1 C420jpeg\nFRAME\n";
+  EXPECT_NE(LineOf(Failure::Side::input, [&] { ClipReader::Open(In("huge.y4m")); })
+                .find("16000 x 16000 pixels are too large"),
+            std::string::npos);
+}
+
+}  // namespace
+}  // namespace calmframe::media
