@@ -1,7 +1,7 @@
 // What a frame costs the warper at 1920 x 1080: its fits, its grid solve, and the whole drive, for
 // as many displacements as the first argument says; drive's second one is the
 // model. BuildDisplacements and Drive take 10 frames at a time.
-#include "stabilization/cp_warper.h"
+#include "stabilization/warp/cp_warper.h"
 
 #include <benchmark/benchmark.h>
 
@@ -13,8 +13,8 @@
 
 #include "platform/dss/dss.h"
 #include "platform/lapack/lapack.h"
-#include "stabilization/grid_solver.h"
-#include "stabilization/robust_pass.h"
+#include "stabilization/models/robust_pass.h"
+#include "stabilization/warp/grid_solver.h"
 
 namespace marrow::stabilization {
 namespace {

@@ -14,10 +14,10 @@
 #include <vector>
 
 #include "bench/side_by_side.h"
-#include "stabilization/cp_warper.h"
-#include "stabilization/cropper.h"
-#include "stabilization/factorization_queue.h"
-#include "stabilization/smooth_windows.h"
+#include "stabilization/crop/cropper.h"
+#include "stabilization/factorization/factorization_queue.h"
+#include "stabilization/smoothing/smooth_windows.h"
+#include "stabilization/warp/cp_warper.h"
 #include "stabilizer/effect/src/parameter_rules.h"
 #include "stabilizer/effect/src/solver.h"
 #include "synthetic/track_world.h"

@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "bench/side_by_side.h"
-#include "stabilization/transitions.h"
+#include "stabilization/transitions/transitions.h"
 
 // Cost of one transition and of one lockdown, by frames and by tracks alive at a time. Arguments:
 // frames, tracks, mean life of a track in frames (0: the whole stretch). `ms` is this thread's own

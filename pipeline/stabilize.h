@@ -8,9 +8,9 @@
 #include <vector>
 
 #include "host/media/clip.h"
-#include "stabilization/cp_warper.h"
-#include "stabilization/cropper.h"
+#include "stabilization/crop/cropper.h"
 #include "stabilization/solve_records.h"
+#include "stabilization/warp/cp_warper.h"
 #include "stabilizer/effect/src/parameter_rules.h"
 #include "tracking/track_store.h"
 

@@ -10,8 +10,8 @@
 namespace marrow::stabilization {
 
 // The result of one factorization: over [first, end) the position of trajectory t on frame f is
-// (C_x(t) . basis(f), C_y(t) . basis(f)) plus the centre (low-rank factorization of a track matrix;
-// Liu, Gleicher, Wang, Jin and Agarwala, Subspace Video Stabilization, 2011).
+// (C_x(t) . basis(f), C_y(t) . basis(f)) plus the centre (the track matrix approximated by one of
+// low rank; Golub and Van Loan, Matrix Computations, 4th ed., 2.4).
 struct factorization_window {
   std::uint64_t first = 0;
   std::uint64_t end = 0;

@@ -3,8 +3,8 @@
 #include <cstddef>
 
 #include "platform/tessel/debug.h"
-#include "stabilization/factorization_queue.h"
-#include "stabilization/smooth_windows.h"
+#include "stabilization/factorization/factorization_queue.h"
+#include "stabilization/smoothing/smooth_windows.h"
 
 namespace marrow::stabilization {
 

@@ -2,7 +2,7 @@
 
 #include <boost/shared_ptr.hpp>
 
-#include "stabilization/cp_warper.h"
+#include "stabilization/warp/cp_warper.h"
 #include "stabilizer/render/frame_renderer.h"
 
 // A warper's records as the renderer reads them. The warper's union bounds must have been computed.

@@ -3,8 +3,8 @@
 #include <cstdint>
 #include <vector>
 
-#include "stabilization/cropper.h"
-#include "stabilization/matrix3.h"
+#include "stabilization/crop/cropper.h"
+#include "stabilization/models/matrix3.h"
 #include "stabilizer/render/renderer.h"
 #include "stabilizer/render/tile_map.h"
 

@@ -6,8 +6,8 @@
 #include <optional>
 #include <vector>
 
-#include "stabilization/cropper.h"
-#include "stabilization/var_vector.h"
+#include "stabilization/crop/cropper.h"
+#include "stabilization/warp/var_vector.h"
 #include "stabilizer/render/deblur.h"
 #include "stabilizer/render/edge_preparation.h"
 #include "stabilizer/render/frame_mesh.h"

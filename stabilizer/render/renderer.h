@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "stabilization/var_vector.h"
+#include "stabilization/warp/var_vector.h"
 
 // The geometry of one render: what the warps' plane, the source and the output rectangle measure at
 // the render's scale. Read-only while strips run.

@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "stabilization/displacements.h"
-#include "stabilization/matrix3.h"
+#include "stabilization/models/matrix3.h"
 
 // Displacements and clips made by hand, for the tests of the warper's parts.
 namespace marrow::stabilization {

@@ -11,7 +11,7 @@
 
 #include "platform/tessel/debug.h"
 #include "stabilization/displacements.h"
-#include "stabilization/matrix3.h"
+#include "stabilization/models/matrix3.h"
 #include "stabilization/stabilizer_main.h"
 #include "synthetic/track_world.h"
 

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "stabilization/cp_warper.h"
+#include "stabilization/warp/cp_warper.h"
 #include "tests/stabilization/solve_clips.h"
 
 // Clips with little or nothing to go by.

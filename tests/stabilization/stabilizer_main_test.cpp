@@ -7,8 +7,8 @@
 #include <tuple>
 #include <vector>
 
-#include "stabilization/active_track.h"
-#include "stabilization/window_filters.h"
+#include "stabilization/factorization/active_track.h"
+#include "stabilization/factorization/window_filters.h"
 #include "tests/stabilization/solve_clips.h"
 
 namespace marrow::stabilization {

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "stabilization/active_track.h"
+#include "stabilization/factorization/active_track.h"
 #include "tests/stabilization/solve_clips.h"
 
 // How the windows of a clip lie, and how their solutions meet.

@@ -2,7 +2,7 @@
 
 #include <boost/make_shared.hpp>
 
-#include "stabilization/cp_warper.h"
+#include "stabilization/warp/cp_warper.h"
 #include "tests/stabilization/displacement_lists.h"
 
 // Whole clips for the warper: random tracks over 1920 x 1080 that live all the time.

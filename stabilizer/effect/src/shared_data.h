@@ -7,8 +7,8 @@
 #include "analysis/src/analyzer.h"
 #include "analysis/src/job_input.h"
 #include "platform/tessel/guid.h"
-#include "stabilization/cp_warper.h"
-#include "stabilization/cropper.h"
+#include "stabilization/crop/cropper.h"
+#include "stabilization/warp/cp_warper.h"
 #include "stabilizer/effect/src/solve_phase.h"
 #include "tracking/track_store.h"
 

@@ -7,10 +7,10 @@
 #include <exception>
 #include <vector>
 
-#include "stabilization/cp_warper.h"
-#include "stabilization/cropper.h"
+#include "stabilization/crop/cropper.h"
 #include "stabilization/solve_records.h"
 #include "stabilization/solver_params.h"
+#include "stabilization/warp/cp_warper.h"
 
 // Turns the tracked features of a clip into a finished stabilization. One object lives for one
 // solve. Its owner starts it, polls its state and takes the results; dropping it cancels it and

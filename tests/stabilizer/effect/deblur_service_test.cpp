@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <vector>
 
-#include "stabilization/frame_map.h"
+#include "stabilization/warp/frame_map.h"
 #include "tests/stabilizer/effect/render_service_fixture.h"
 
 namespace kelp::effect {

@@ -2,7 +2,7 @@
 
 #include <boost/make_shared.hpp>
 
-#include "stabilization/frame_map.h"
+#include "stabilization/warp/frame_map.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "tests/stabilizer/effect/render_service_fixture.h"
 

@@ -11,7 +11,7 @@
 #include "analysis/src/read_job_input.h"
 #include "effect/entry.h"
 #include "platform/tessel/threads.h"
-#include "stabilization/frame_map.h"
+#include "stabilization/warp/frame_map.h"
 #include "stabilizer/effect/src/solve_hash.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
 #include "tests/effect/fake_pixels.h"

@@ -4,9 +4,9 @@
 #include <cstdint>
 
 #include "platform/tessel/filesupport.h"
-#include "stabilization/cp_warper.h"
-#include "stabilization/cropper.h"
-#include "stabilization/frame_map.h"
+#include "stabilization/crop/cropper.h"
+#include "stabilization/warp/cp_warper.h"
+#include "stabilization/warp/frame_map.h"
 
 // The sections of a solve's results within a stored state. Readers throw StreamError for damage and
 // take no more memory than a small multiple of what they have read.

@@ -1,0 +1,27 @@
+#pragma once
+
+#include <vector>
+
+#include "stabilization/models/similarity.h"
+#include "stabilization/progress.h"
+#include "stabilization/solve_records.h"
+#include "stabilization/solver_params.h"
+
+// Frames that no factorization window covers: one plane similarity a frame, found so that the
+// tracks stay smooth across the stretch and join up with what lies before it (transition), or tied
+// to one fixed similarity (lockdown).
+namespace marrow::stabilization {
+
+// Solves [first, end) and appends its records, ascending in frame. Reads global.input,
+// global.trajectories and, for the frames before `first`, global.output; writes global.output.
+// translation_only drops scale and rotation.
+void transition_window(stabilizer_global& global, std::uint64_t first, std::uint64_t end,
+                       const SolverParamsRecord& parameters, bool translation_only,
+                       std::vector<transition_record>& records, const progress_functor& progress);
+
+// Ties every frame of [first, end) to `target`.
+void lockdown_window(stabilizer_global& global, std::uint64_t first, std::uint64_t end,
+                     const SolverParamsRecord& parameters, const similarity& target,
+                     std::vector<transition_record>& records, const progress_functor& progress);
+
+}  // namespace marrow::stabilization

@@ -1,0 +1,369 @@
+#include "stabilization/warp/cp_warper.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <utility>
+#include <vector>
+
+#include "tests/stabilization/warper_clips.h"
+
+namespace marrow::stabilization {
+namespace {
+
+const matrix3 kHomography = {1.02, 0.03, 5, -0.01, 0.98, -7, 1e-5, -2e-5, 1};
+// Targets are 32-bit floats at up to 2000 px.
+constexpr double kFloat = 2e-4;
+
+const auto under = [](const matrix3& m) { return [m](int, point2 p) { return transform(m, p); }; };
+// No homography: a wave of 3 px.
+const auto wavy = [](int, point2 p) {
+  return point2{p.x + 3 * std::sin(p.y / 150), p.y + 3 * std::sin(p.x / 200)};
+};
+
+TEST(WarpGridTest, VerticesForUsualSizes) {
+  const int sizes[][4] = {{640, 480, 54, 42},   {720, 576, 53, 43},   {720, 480, 59, 39},
+                          {768, 576, 54, 42},   {1280, 720, 64, 36},  {1920, 1080, 64, 36},
+                          {3840, 2160, 64, 36}, {1440, 1080, 54, 42}, {1920, 800, 74, 31},
+                          {4096, 2160, 65, 35}, {1080, 1920, 36, 64}, {1920, 1, 768, 3},
+                          {1, 1920, 3, 768}};
+  for (const auto& [width, height, cols, rows] : sizes) {
+    const warp_grid grid(width, height);
+    EXPECT_EQ(grid.cols, cols) << width << "x" << height;
+    EXPECT_EQ(grid.rows, rows) << width << "x" << height;
+  }
+  const warp_grid hd(1920, 1080);
+  EXPECT_NEAR(hd.cellWidth, 30.46031746, 1e-8);
+  EXPECT_NEAR(hd.cellHeight, 30.82857143, 1e-8);
+}
+
+TEST(CPWarperTest, EachMethodMovesTheGridByItsOwnModel) {
+  const auto moved = driven(clip_of(60, 4, under({1, 0, 4, 0, 1, -3, 0, 0, 1})), 1);
+  EXPECT_LT(distance_from(*moved, 2, {1, 0, 4, 0, 1, -3, 0, 0, 1}), kFloat);
+  const matrix3 similar = similarity_matrix(1.02, .03, 9, -8);
+  EXPECT_LT(distance_from(*driven(clip_of(60, 4, under(similar)), 2), 2, similar), kFloat);
+  EXPECT_LT(distance_from(*driven(clip_of(60, 4, under(kHomography)), 3), 2, kHomography),
+            10 * kFloat);
+}
+
+TEST(CPWarperTest, TheSolvedGridFollowsAWaveFurtherThanTheHomographyButStaysStiff) {
+  const auto global = clip_of(400, 2, wavy);
+  const auto misfit = [&](const CPWarper& warper) {
+    double sum = 0;
+    for (const Displacement& d : warper.displacements(1)) {
+      const VarVector& g = *warper.frameWarp(1);
+      const auto mix = [&](double a, double b, double c, double e) {
+        return (a * (1 - d.fracX) + b * d.fracX) * (1 - d.fracY) +
+               (c * (1 - d.fracX) + e * d.fracX) * d.fracY;
+      };
+      const point2 a = g.vertex(d.cellX, d.cellY), b = g.vertex(d.cellX + 1, d.cellY);
+      const point2 c = g.vertex(d.cellX, d.cellY + 1), e = g.vertex(d.cellX + 1, d.cellY + 1);
+      const double dx = mix(a.x, b.x, c.x, e.x) - d.targetX;
+      const double dy = mix(a.y, b.y, c.y, e.y) - d.targetY;
+      sum += dx * dx + dy * dy;
+    }
+    return std::sqrt(sum / warper.displacements(1).size());
+  };
+  const double homography = misfit(*driven(global, 3));
+  const double solved = misfit(*driven(global, 4));
+  EXPECT_GT(homography, 2);
+  EXPECT_LT(solved, 0.97 * homography);
+  EXPECT_GT(solved, 0.3 * homography);
+}
+
+TEST(CPWarperTest, WhereAHomographySufficesItIsTheFrame) {
+  // Exact targets in 32-bit floats: whole numbers.
+  const matrix3 exact = {1, 0, 4, 0, 1, -3, 0, 0, 1};
+  const auto warper = driven(clip_of(60, 2, under(exact)), 4);
+  EXPECT_LT(distance_from(*warper, 1, exact), 3e-4);
+  for (const std::int32_t q : quantise(*warper->frameWarp(1)).offsets) ASSERT_EQ(q, 0);
+}
+
+TEST(CPWarperTest, NoisyHomographyKeepsTheSolvedGridNearItsBase) {
+  std::mt19937 random(2);
+  std::normal_distribution<double> noise(0, 0.1);
+  const auto global = clip_of(400, 2, [&](int, point2 p) {
+    const point2 q = transform(kHomography, p);
+    return point2{q.x + noise(random), q.y + noise(random)};
+  });
+  const auto base = driven(global, 3), solved = driven(global, 4);
+  double largest = 0;
+  for (std::size_t i = 0; i < base->frameWarp(1)->values.size(); ++i) {
+    largest = std::max(largest,
+                       std::fabs(base->frameWarp(1)->values[i] - solved->frameWarp(1)->values[i]));
+  }
+  EXPECT_LT(largest, 0.08);
+  EXPECT_GT(largest, 0.004);
+}
+
+TEST(CPWarperTest, ScoreBetweenTwoAndThreeBlendsMatrixEntries) {
+  const auto global = clip_of(60, 2, under(kHomography));
+  auto warper = built(global, 2.5);
+  const std::vector<Displacement> list = warper->displacements(1);
+  const matrix3 s = fitSimilarity(list), h = fitHomography(list);
+  matrix3 middle;
+  for (int i = 0; i < 9; ++i) middle[i] = (s[i] + h[i]) / 2;
+  warper->drive([] {});
+  EXPECT_LT(distance_from(*warper, 1, middle), 1e-8);
+}
+
+TEST(CPWarperTest, ScoreBetweenThreeAndFourBlendsGrids) {
+  const auto global = clip_of(200, 2, wavy);
+  const auto base = driven(global, 3), half = driven(global, 3.5), solved = driven(global, 4);
+  double apart = 0;
+  for (std::size_t i = 0; i < base->frameWarp(1)->values.size(); ++i) {
+    const double b = base->frameWarp(1)->values[i], s = solved->frameWarp(1)->values[i];
+    apart = std::max(apart, std::fabs(b - s));
+    ASSERT_NEAR(half->frameWarp(1)->values[i], (b + s) / 2, 1.0 / 256);
+  }
+  EXPECT_GT(apart, 0.1);
+}
+
+TEST(CPWarperTest, MethodAboveTheLastIsTheLast) {
+  EXPECT_EQ(built(clip_of(20, 2, wavy), 9)->modelScore(0), 4.0);
+}
+
+TEST(CPWarperTest, TransitionFramesTakeTheirStoredMotion) {
+  transition_record record;
+  record.first = 3;
+  record.end = 6;
+  record.motion = {1, 0, 4, 5, 1.1, .1, 6, 7, 1, 0, 0, 0};
+  const auto global = clip_of(60, 20, [&](int f, point2 p) {
+    if (f < 3 || f >= 6) return transform(kHomography, p);
+    const double* m = &record.motion[4 * (f - 3)];
+    return transform(similarity_matrix(m[0], m[1], m[2], m[3]), p);
+  });
+  std::vector<factorization_window> windows(2);
+  windows[0].end = 3;
+  windows[1].first = 5;  // frame 5 is covered as well and stays a window's frame
+  windows[1].end = 20;
+  SolverParamsRecord parameters;
+  parameters.track_fade_minimum = 0;
+  for (const float method : {1.0f, 3.0f}) {
+    CPWarper warper(20, kWidth, kHeight);
+    parameters.method_level = method;
+    warper.buildDisplacements(global, windows, {record}, parameters, [] {});
+    warper.drive([] {});
+    EXPECT_EQ(warper.modelScore(4), method == 1 ? 1 : 2);
+    EXPECT_NEAR(warper.modelScore(19), method == 1 ? 1 : 3, 1e-12);
+    if (method == 3) {
+      EXPECT_NEAR(warper.modelScore(5), 2 + 1.0 / 15, 1e-12);
+    }
+    const matrix3 stored =
+        method == 1 ? matrix3{1, 0, 6, 0, 1, 7, 0, 0, 1} : similarity_matrix(1.1, .1, 6, 7);
+    EXPECT_LT(distance_from(warper, 4, stored), 1e-9);
+  }
+}
+
+TEST(CPWarperTest, StoredMotionThatMissesItsTargetsFailsTheSolve) {
+  transition_record record;
+  record.end = 2;
+  record.motion = {1, 0, 0, 0, 1, 0, 0, 0.02};
+  const auto global = clip_of(6, 2, under(identity3));
+  try {
+    built(global, 4, {record}, false);
+    FAIL();
+  } catch (const std::runtime_error& error) {
+    EXPECT_STREQ(error.what(), "Homograph is not consistent with displacements on frame");
+  }
+  record.motion[7] = 0.008;
+  EXPECT_EQ(built(global, 4, {record}, false)->modelScore(1), 2);
+}
+
+TEST(CPWarperTest, AWildHomographyIsLimitedToASimilarityFromSixTracksOn) {
+  // All tracks on one line but one: the homography runs away.
+  const auto scores = [](int tracks) {
+    auto global = boost::make_shared<stabilizer_global>(empty_clip(tracks, 1));
+    for (int s = 0; s < tracks; ++s) {
+      const point2 p = {100.0 + 37 * s * s, 500.0 + (s == 0 ? 1 : 0)};
+      add_track(
+          *global, s, 0, 1, [&](int) { return p; },
+          [&](int, point2 q) {
+            return point2{q.x + (s % 2 ? 40 : -40), q.y + 90 * (s % 3)};
+          });
+    }
+    return built(global, 4)->modelScore(0);
+  };
+  EXPECT_EQ(scores(5), 4);
+  EXPECT_EQ(scores(6), 2);
+}
+
+TEST(CPWarperTest, AFrameWhoseTracksDisagreeBecomesASimilarityAndItsNeighboursRampToIt) {
+  // Two rings of four corners, moved to and fro along x in turn: the best similarity is the
+  // identity and leaves every track `apart` away.
+  const auto scores = [](double apart) {
+    auto global = boost::make_shared<stabilizer_global>(empty_clip(8, 120));
+    for (int s = 0; s < 8; ++s) {
+      const double ring = s < 4 ? 400 : 200, right = s & 1 ? 1 : -1, low = s & 2 ? 1 : -1;
+      add_track(
+          *global, s, 0, 120,
+          [&](int) {
+            return point2{960 + ring * right, 540 + ring * low};
+          },
+          [&](int f, point2 p) {
+            return point2{p.x + (f == 50 ? apart * right * low : 0), p.y};
+          });
+    }
+    SolverParamsRecord parameters;
+    parameters.homography_limit = 1e9f;
+    CPWarper warper(120, kWidth, kHeight);
+    warper.buildDisplacements(global, whole_clip(120), {}, parameters, [] {});
+    std::vector<double> found;
+    for (const int f : {50, 51, 36, 35, 65, 20, 19}) found.push_back(warper.modelScore(f));
+    return found;
+  };
+  // 0.15 of the frame's width is 288.
+  EXPECT_EQ(scores(287), std::vector<double>(7, 4.0));
+  EXPECT_THAT(scores(289),
+              testing::Pointwise(testing::DoubleNear(1e-12),
+                                 {2.0, 2 + 1.0 / 15, 2 + 14.0 / 15, 3.0, 3.0, 4.0, 4.0}));
+}
+
+TEST(CPWarperTest, AnOutlierWeighsItsTrackDownForSixtyFrames) {
+  auto global = boost::make_shared<stabilizer_global>(empty_clip(20, 200));
+  for (int s = 0; s < 20; ++s) {
+    add_track(
+        *global, s, 0, 200,
+        [&](int) {
+          return point2{100.0 + 80 * s, 100.0 + 311 * s % 800};
+        },
+        [&](int f, point2 p) {
+          return point2{p.x + 5 + (s == 7 && f == 100 ? 60 : 0), p.y};
+        });
+  }
+  const auto warper = built(global, 4);
+  const std::pair<int, double> expected[] = {{100, 0.0},       {99, 1.0 / 60}, {101, 1.0 / 60},
+                                             {70, 0.5},        {130, 0.5},     {41, 59.0 / 60},
+                                             {159, 59.0 / 60}, {40, 1.0},      {160, 1.0}};
+  for (const auto& [frame, weight] : expected) {
+    EXPECT_NEAR(warper->displacements(frame)[7].weight, weight, 1e-12) << "frame " << frame;
+    EXPECT_EQ(warper->displacements(frame)[8].weight, 1.0);
+  }
+}
+
+TEST(CPWarperTest, AFrameWithoutTracksHasNoPlace) {
+  const auto warper = driven(clip_of(0, 2, wavy), 4);
+  EXPECT_EQ(warper->modelScore(0), 1);
+  EXPECT_TRUE(std::isnan(warper->frameWarp(0)->values[0]));
+  EXPECT_GT(warper->frameBounds(0).min_x, 1e38);
+  EXPECT_GT(warper->frameBounds(0).max_x, 0);
+  EXPECT_LT(warper->frameBounds(0).max_x, 1e-37);
+  EXPECT_TRUE(warper->boundsEmpty());
+}
+
+TEST(CPWarperTest, ProgressMayCancelAtAnyCall) {
+  struct cancelled {};
+  const auto global = clip_of(30, 3, wavy);
+  for (int calls = 0;; ++calls) {
+    int left = calls;
+    CPWarper warper(3, kWidth, kHeight);
+    SolverParamsRecord parameters;
+    parameters.track_fade_minimum = 0;
+    const progress_functor progress = [&] {
+      if (left-- == 0) throw cancelled();
+    };
+    try {
+      warper.buildDisplacements(global, whole_clip(3), {}, parameters, progress);
+      warper.drive(progress);
+      EXPECT_TRUE(warper.driven());
+      EXPECT_EQ(warper.frameWarpCount(), 3u);
+      EXPECT_GE(calls, 3 + 2 * 3);
+      break;
+    } catch (const cancelled&) {
+      EXPECT_FALSE(warper.driven());
+    }
+  }
+}
+
+class FrameBoundsTest : public ::testing::Test {
+ protected:
+  void Store(const matrix3& m, point2 inner = {0, 0}) {
+    auto grid = boost::make_shared<VarVector>(4, 3);
+    for (int i = 0; i < 12; ++i) {
+      const point2 p = transform(m, {i % 4 * 30.0, i / 4 * 30.0});
+      grid->values[2 * i] = p.x;
+      grid->values[2 * i + 1] = p.y;
+    }
+    grid->values[10] += inner.x;
+    grid->values[11] += inner.y;
+    warper_.storeFrameWarp(grid, false);
+  }
+  CPWarper warper_{3, 91, 61};
+};
+
+TEST_F(FrameBoundsTest, TheOuterRingAlone) {
+  Store({1, 0, 5, 0, 1, -4, 0, 0, 1}, {1000, -1000});
+  const frame_bounds b = warper_.frameBounds(0);
+  EXPECT_EQ(b.min_x, 5);
+  EXPECT_EQ(b.min_y, -4);
+  EXPECT_EQ(b.max_x, 95);
+  EXPECT_EQ(b.max_y, 56);
+  EXPECT_THROW(warper_.frameWarp(1), std::out_of_range);
+  try {
+    warper_.frameBounds(1);
+  } catch (const std::out_of_range& error) {
+    EXPECT_STREQ(error.what(), "invalid vector<T> subscript");
+  }
+}
+
+TEST_F(FrameBoundsTest, MaximaStartJustAboveZero) {
+  Store({1, 0, -500, 0, 1, -400, 0, 0, 1});
+  EXPECT_EQ(warper_.frameBounds(0).max_x, 1.1754943508222875e-38);
+  EXPECT_EQ(warper_.frameBounds(0).min_y, -400);
+}
+
+TEST_F(FrameBoundsTest, UnionAndIntersection) {
+  Store(identity3);
+  Store({1, 0, 40, 0, 1, 20, 0, 0, 1});
+  EXPECT_EQ(warper_.unionBounds().min_x, 0);
+  EXPECT_EQ(warper_.unionBounds().max_x, 130);
+  EXPECT_EQ(warper_.unionBounds().max_y, 80);
+  EXPECT_FALSE(warper_.boundsEmpty());
+  Store({1, 0, 89.5, 0, 1, 0, 0, 0, 1});
+  EXPECT_TRUE(warper_.boundsEmpty());
+}
+
+// The robust pass around a gap, as a solve in progress uses it.
+TEST(CPWarperForWindowsTest, ProjectsTheFramesOwnMotionOverEveryLiveSource) {
+  const matrix3 motion = similarity_matrix(1.05, .02, 30, -20);
+  const auto global = clip_of(12, 80, under(motion));
+  std::vector<factorization_window> windows = whole_clip(80);
+  windows[0].trajectory_flags.assign(12, 1);
+  windows[0].trajectory_flags[11] = 0;  // not a member: projected all the same
+  CPWarper warper(80, kWidth, kHeight);
+  warper.buildDisplacementsForWindows(*global, windows, {});
+  for (int f = 0; f < 80; ++f) global->output_at(f, 5).status = -1;  // dropped by the prune
+  global->output_at(79, 3).x += 300;                                 // outlier
+  warper.pruneDisplacements(79);
+  EXPECT_EQ(warper.displacements(79).size(), 10u);
+  EXPECT_EQ(warper.displacements(19).size(), 10u);
+  EXPECT_EQ(warper.displacements(18).size(), 11u);
+  warper.reweightRecent(79);
+  EXPECT_EQ(warper.displacements(79)[3].weight, 0);
+  EXPECT_NEAR(warper.displacements(78)[3].weight, 1.0 / 60, 1e-12);
+  warper.projectFrame(79, false);
+  for (int s = 0; s < 12; ++s) {
+    const point2 p = transform(motion, {global->input_at(79, s).x, global->input_at(79, s).y});
+    EXPECT_NEAR(global->output_at(79, s).x, p.x, 1e-3) << s;
+    EXPECT_NEAR(global->output_at(79, s).y, p.y, 1e-3) << s;
+    EXPECT_EQ(global->output_at(79, s).status, 0);
+  }
+}
+
+TEST(CPWarperForWindowsTest, FiveTracksAreTooFewToProject) {
+  const auto global = clip_of(5, 10, wavy);
+  std::vector<factorization_window> windows = whole_clip(10);
+  windows[0].trajectory_flags.assign(5, 1);
+  CPWarper warper(10, kWidth, kHeight);
+  warper.buildDisplacementsForWindows(*global, windows, {});
+  try {
+    warper.projectFrame(9, true);
+    FAIL();
+  } catch (const std::runtime_error& error) {
+    EXPECT_STREQ(error.what(), "Not enough features for computing similarity transform");
+  }
+}
+
+}  // namespace
+}  // namespace marrow::stabilization
