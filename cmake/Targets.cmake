@@ -25,22 +25,37 @@ function(calmframe_program name)
   target_link_libraries(${name} PRIVATE ${ARG_LINKS})
 endfunction()
 
-# One test program a folder. LABELS threads: the tests that the thread sanitizer runs, built by the target thread_tests.
+# calmframe_test(host_test [LABELS threads] SOURCES ... [LINKS ...] [DEPENDS ...] [DEFINITIONS ...]): adds tests to a program;
+# folders that link alike share one. Every suite of a program is a test of ctest, "host_test.FrameCacheTest".
+# LABELS threads: what the thread sanitizer runs, built by the target thread_tests. The reference loops of most tests are
+# short, so these programs are built quickly rather than to be quick; a source with long loops says so itself.
 function(calmframe_test name)
-  cmake_parse_arguments(ARG "" "LABELS" "SOURCES;LINKS" ${ARGN})
-  calmframe_program(${name} SOURCES ${ARG_SOURCES} LINKS ${ARG_LINKS} GTest::gmock GTest::gtest_main)
-  target_compile_options(${name} PRIVATE -Wno-conversion)
-  set(properties TIMEOUT 600)
-  if(ARG_LABELS)
-    list(APPEND properties LABELS ${ARG_LABELS})
+  cmake_parse_arguments(ARG "" "LABELS" "SOURCES;LINKS;DEPENDS;DEFINITIONS" ${ARGN})
+  if(NOT TARGET ${name})
+    calmframe_program(${name} SOURCES ${ARG_SOURCES} LINKS ${ARG_LINKS} GTest::gmock GTest::gtest_main)
+    target_compile_options(${name} PRIVATE -Wno-conversion -O1)
+    target_precompile_headers(${name} REUSE_FROM test_headers)
+    set(list "${CMAKE_BINARY_DIR}/suites/${name}.cmake")
+    add_custom_command(TARGET ${name} POST_BUILD
+      COMMAND "${CMAKE_COMMAND}" -DPROGRAM=$<TARGET_FILE:${name}> -DNAME=${name} -DLABELS=${ARG_LABELS} -DLIST=${list}
+        -P "${CMAKE_SOURCE_DIR}/cmake/ListSuites.cmake"
+      BYPRODUCTS "${list}" VERBATIM)
+    # A program that was not built has no list, and its absence must show.
+    file(WRITE "${CMAKE_BINARY_DIR}/suites/include_${name}.cmake"
+      "if(EXISTS \"${list}\")\n  include(\"${list}\")\nelse()\n  add_test(${name}_NOT_BUILT ${name}_NOT_BUILT)\nendif()\n")
+    set_property(DIRECTORY APPEND PROPERTY TEST_INCLUDE_FILES "${CMAKE_BINARY_DIR}/suites/include_${name}.cmake")
     if("threads" IN_LIST ARG_LABELS)
-      if(NOT TARGET thread_tests)
-        add_custom_target(thread_tests)
-      endif()
       add_dependencies(thread_tests ${name})
     endif()
+    add_dependencies(all_tests ${name})
+  else()
+    target_sources(${name} PRIVATE ${ARG_SOURCES})
+    target_link_libraries(${name} PRIVATE ${ARG_LINKS})
   endif()
-  gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES ${properties})
+  if(ARG_DEPENDS)
+    add_dependencies(${name} ${ARG_DEPENDS})
+  endif()
+  target_compile_definitions(${name} PRIVATE ${ARG_DEFINITIONS})
 endfunction()
 
 function(calmframe_bench name)

@@ -1,0 +1,23 @@
+cmake_minimum_required(VERSION 3.25)
+# Writes LIST, which gives ctest a test for each suite of PROGRAM. Parameters and types of a suite run with it.
+execute_process(COMMAND "${PROGRAM}" --gtest_list_tests OUTPUT_VARIABLE listed COMMAND_ERROR_IS_FATAL ANY)
+string(REGEX MATCHALL "(^|\n)[^ \n]+\\." lines "${listed}")  # cases are indented below their suite
+set(suites)
+foreach(line IN LISTS lines)
+  string(REGEX REPLACE "^\n" "" suite "${line}")
+  string(REGEX REPLACE "\\.$" "" suite "${suite}")
+  string(REGEX REPLACE "/[0-9]+$" "" suite "${suite}")
+  string(REGEX REPLACE "^.*/" "" suite "${suite}")
+  list(APPEND suites "${suite}")
+endforeach()
+list(REMOVE_DUPLICATES suites)
+set(text)
+foreach(suite IN LISTS suites)
+  set(filter "${suite}.*:*/${suite}.*:${suite}/*.*:*/${suite}/*.*")
+  string(APPEND text "add_test([[${NAME}.${suite}]] [[${PROGRAM}]] [[--gtest_filter=${filter}]])\n"
+    "set_tests_properties([[${NAME}.${suite}]] PROPERTIES TIMEOUT 900 LABELS [[${LABELS}]])\n")
+endforeach()
+if(NOT suites)
+  message(FATAL_ERROR "${NAME} has no test")
+endif()
+file(WRITE "${LIST}" "${text}")
