@@ -10,9 +10,10 @@
 #include <opencv2/video/tracking.hpp>
 #include <vector>
 
+#include "analysis/effect/analysis_parameter_rows.h"
+#include "analysis/effect/analysis_parameter_rules.h"
 #include "bench/side_by_side.h"
 #include "host/media/clip.h"
-#include "pipeline/stabilize.h"
 #include "synthetic/scene.h"
 #include "tracking/color_pyramid.h"
 #include "tracking/feature_selector.h"
@@ -29,7 +30,6 @@
 namespace {
 
 using namespace marrow::tracking;
-using kelp::effect::Controls;
 using side_by_side::Compare;
 
 constexpr std::size_t kFrames = 8;
@@ -95,23 +95,33 @@ const Frames& Input() {
   return frames;
 }
 
-kelp::effect::ClipGeometry Geometry() {
-  kelp::effect::ClipGeometry geometry;
-  geometry.width = static_cast<std::uint32_t>(Input().width);
-  geometry.height = static_cast<std::uint32_t>(Input().height);
-  return geometry;
-}
+// The parameters as they stand when the effect is applied, but for Detailed Analysis.
+class Defaults final : public kelp::effect::VisibleParameterReader {
+ public:
+  explicit Defaults(bool detailed) : detailed_(detailed) {}
+
+ private:
+  std::int32_t IndexOf(std::int32_t id) const override { return id; }
+  bool IsAbsent(std::int32_t id) const override {
+    return id != kelp::analysis::effect::kDetailedAnalysisParam;
+  }
+  double Default(std::int32_t id) const override {
+    return kelp::analysis::effect::AnalysisParameterRow(id)->default_value;
+  }
+  double Value(std::int32_t) const override { return detailed_; }
+
+  const bool detailed_;
+};
 
 SelectorParams SelectorOf(bool detailed) {
-  Controls controls;
-  controls.detailed_analysis = detailed;
-  return MakeSelectorParams(controls, Geometry());
+  return kelp::analysis::effect::GetSelectorParams(Defaults(detailed),
+                                                   static_cast<std::uint32_t>(Input().width),
+                                                   static_cast<std::uint32_t>(Input().height));
 }
 
 TrackerParams TrackerOf(bool detailed) {
-  Controls controls;
-  controls.detailed_analysis = detailed;
-  return MakeTrackerParams(controls, Geometry());
+  return kelp::analysis::effect::GetTrackerParams(Defaults(detailed),
+                                                  static_cast<std::uint32_t>(Input().height));
 }
 
 std::size_t FrameOfRun(std::size_t t) {

@@ -8,8 +8,10 @@
 #include <cmath>
 #include <random>
 
-#include "pipeline/host_operations.h"
+#include "host/pixels/world_operations.h"
 #include "platform/tessel/threads.h"
+#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/output_rect.h"
 
 // Milliseconds a frame, on one processor, whose edges are filled from 15 neighbours on each side,
 // in a shot whose frames lie up to `shake` pixels off their place and are turned by up to half a
@@ -19,6 +21,7 @@
 // sources and into the host's transfers. Arguments: width, height, shake.
 namespace {
 
+using namespace marrow::render;
 using marrow::stabilization::frame_bounds;
 using marrow::stabilization::VarVector;
 
@@ -99,16 +102,12 @@ class TimedOperations final : public WorldOperations<Pixel> {
  public:
   void TransferBehind(const WorldX<Pixel>& from, int x, int y, WorldX<Pixel>& to) override {
     const double begin = Now();
-    host_.TransferBehind(from, x, y, to);
+    HX_World target = world_of(to);
+    calmframe::host::Transfer(world_of(from), kBehind, x, y, target);
     spent += Now() - begin;
   }
-  void Blur(const WorldX<Pixel>& from, WorldX<Pixel>& to, float radius) override {
-    host_.Blur(from, to, radius);
-  }
+  void Blur(const WorldX<Pixel>&, WorldX<Pixel>&, float) override {}  // no frame is deblurred
   double spent = 0;
-
- private:
-  calmframe::pipeline::HostOperations<Pixel> host_;
 };
 
 double Median(std::vector<double> values) {
@@ -122,7 +121,7 @@ void SynthesisBesideRenders(benchmark::State& state) {
   const int width = static_cast<int>(state.range(0)), height = static_cast<int>(state.range(1));
   const tessel::threads::ProcessorLimit limit(1);
   const Shot shot(width, height, static_cast<int>(state.range(2)));
-  Renderer renderer = MakeRenderer(shot, 1, 1);
+  Renderer renderer = makeRenderer(shot, 1, 1);
   Frames<Pixel> frames(width, height);
   TimedOperations<Pixel> operations;
   RenderSettings alone, filled;

@@ -1,5 +1,5 @@
-#include "pipeline/host_operations.h"
 #include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/output_rect.h"
 
 #include <benchmark/benchmark.h>
 
@@ -20,6 +20,7 @@
 // The counter `ratio` is ours to cv::remap, median to median. Arguments: width, height.
 namespace {
 
+using namespace marrow::render;
 using marrow::stabilization::frame_bounds;
 using marrow::stabilization::point2;
 using marrow::stabilization::VarVector;
@@ -114,13 +115,21 @@ class Frame final : public SourceFrames<Pixel> {
   boost::shared_ptr<WorldX<Pixel>> world_;
 };
 
+// A cropped frame asks for none.
+template <class Pixel>
+class NoOperations final : public WorldOperations<Pixel> {
+ public:
+  void TransferBehind(const WorldX<Pixel>&, int, int, WorldX<Pixel>&) override {}
+  void Blur(const WorldX<Pixel>&, WorldX<Pixel>&, float) override {}
+};
+
 template <class Pixel>
 struct Render {
   explicit Render(const benchmark::State& state)
       : width(static_cast<int>(state.range(0))),
         height(static_cast<int>(state.range(1))),
         clip(width, height),
-        renderer(MakeRenderer(clip, 1, 1)),
+        renderer(makeRenderer(clip, 1, 1)),
         source(width, height),
         crop(1, 1, 1),
         out(width, height) {
@@ -136,7 +145,7 @@ struct Render {
 
   // Source position of every output pixel: the crop's centre goes to the output's.
   cv::Mat Map() {
-    const double z = GetZoom(clip, &crop, {}, renderer);
+    const double z = getZoom(clip, &crop, {}, renderer);
     const crop_rect& rect = crop.rects[0];
     cv::Mat map(height, width, CV_32FC2);
     for (int y = 0; y < height; ++y) {
@@ -154,7 +163,7 @@ struct Render {
   Clip clip;
   Renderer renderer;
   Frame<Pixel> source;
-  calmframe::pipeline::HostOperations<Pixel> operations;
+  NoOperations<Pixel> operations;
   cropper crop;
   WorldX<Pixel> out;
 };

@@ -9,20 +9,22 @@
 #include <vector>
 
 #include "platform/tessel/threads.h"
-#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/frame_pass.h"
 
-using marrow::stabilization::point2;
-using marrow::stabilization::VarVector;
+namespace marrow::render {
+
+using stabilization::point2;
+using stabilization::VarVector;
 
 namespace {
 
 constexpr std::int32_t aligned_range = 2;
 
-bool shows_aligned(const DeblurSettings& settings) {
+bool showsAligned(const DeblurSettings& settings) {
   return settings.debug == DeblurDebug::aligned_frame;
 }
 
-std::int64_t aligned_offset(const DeblurSettings& settings) {
+std::int64_t alignedOffset(const DeblurSettings& settings) {
   return static_cast<std::int64_t>(settings.aligned_frame);
 }
 
@@ -40,9 +42,9 @@ double speed(const ClipWarps& warps, std::int64_t frame) {
 }
 
 // The frame whose pixels may be taken, which may lie outside the clip for the aligned view alone.
-std::optional<std::int64_t> sharper_frame(const ClipWarps& warps, std::int64_t frame,
-                                          const DeblurSettings& settings) {
-  const bool aligned = shows_aligned(settings);
+std::optional<std::int64_t> sharperFrame(const ClipWarps& warps, std::int64_t frame,
+                                         const DeblurSettings& settings) {
+  const bool aligned = showsAligned(settings);
   const std::int64_t range = aligned ? aligned_range : settings.range;
   const double own = speed(warps, frame);
   if (!(own > (aligned ? -1.0 : settings.frame_threshold))) return std::nullopt;
@@ -57,13 +59,13 @@ std::optional<std::int64_t> sharper_frame(const ClipWarps& warps, std::int64_t f
     slowest = j;
     least = candidate;
   }
-  if (slowest && aligned) return frame + aligned_offset(settings);
+  if (slowest && aligned) return frame + alignedOffset(settings);
   return slowest;
 }
 
 // Calls visit(first, end) for bands of rows, on all processors.
 template <class Visit>
-void for_rows(int height, const Visit& visit) {
+void forRows(int height, const Visit& visit) {
   constexpr int band = 32;
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
       [&](std::size_t i) {
@@ -111,8 +113,8 @@ struct depth<HX_PixelFloat> {
 
 // How much of a row's sharper pixels may be taken, 0 to 1 each; b and c are the blurred ones.
 template <class Pixel>
-void weigh_row(const Pixel* sharper, const Pixel* b, const Pixel* c, int width, float t1, float t2,
-               float* weights) {
+void weighRow(const Pixel* sharper, const Pixel* b, const Pixel* c, int width, float t1, float t2,
+              float* weights) {
   using D = depth<Pixel>;
   for (int x = 0; x < width; ++x) {
     const float d = D::difference(b[x].red, c[x].red) + D::difference(b[x].green, c[x].green) +
@@ -124,7 +126,7 @@ void weigh_row(const Pixel* sharper, const Pixel* b, const Pixel* c, int width, 
 }
 
 template <class Pixel>
-void mix_row(const Pixel* sharper, const float* weights, int width, Pixel* out) {
+void mixRow(const Pixel* sharper, const float* weights, int width, Pixel* out) {
   using D = depth<Pixel>;
   for (int x = 0; x < width; ++x) {
     if (!(weights[x] > 0.0f)) continue;
@@ -140,7 +142,7 @@ void mix_row(const Pixel* sharper, const float* weights, int width, Pixel* out) 
 }
 
 template <class Pixel>
-void map_row(const float* weights, int width, Pixel* out) {
+void mapRow(const float* weights, int width, Pixel* out) {
   using D = depth<Pixel>;
   for (int x = 0; x < width; ++x) {
     const auto w = D::weight(weights[x]);
@@ -151,8 +153,8 @@ void map_row(const float* weights, int width, Pixel* out) {
 }  // namespace
 
 std::int32_t deblurReach(const DeblurSettings& settings) {
-  if (settings.range <= 0 || !shows_aligned(settings)) return std::max(settings.range, 0);
-  return static_cast<std::int32_t>(std::abs(aligned_offset(settings)));
+  if (settings.range <= 0 || !showsAligned(settings)) return std::max(settings.range, 0);
+  return static_cast<std::int32_t>(std::abs(alignedOffset(settings)));
 }
 
 template <class Pixel>
@@ -160,7 +162,7 @@ void deblurFrame(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
   const DeblurSettings& settings = pass.settings.deblur;
   if (settings.range <= 0 || output.width() < 1 || output.height() < 1) return;
   const std::optional<std::int64_t> j =
-      sharper_frame(pass.warps, static_cast<std::int64_t>(pass.frame), settings);
+      sharperFrame(pass.warps, static_cast<std::int64_t>(pass.frame), settings);
   if (!j) return;
 
   const int width = output.width(), height = output.height();
@@ -191,15 +193,15 @@ void deblurFrame(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
   pass.operations.Blur(output, this_blurred, settings.comparison_blur);
   const float t1 = settings.pixel_threshold * depth<Pixel>::full;
   const float t2 = settings.pixel_limit * depth<Pixel>::full;
-  for_rows(height, [&](int first, int end) {
+  forRows(height, [&](int first, int end) {
     std::vector<float> weights(static_cast<std::size_t>(width));
     for (int y = first; y < end; ++y) {
-      weigh_row(sharper.row(y), sharper_blurred.row(y), this_blurred.row(y), width, t1, t2,
-                weights.data());
+      weighRow(sharper.row(y), sharper_blurred.row(y), this_blurred.row(y), width, t1, t2,
+               weights.data());
       if (settings.show_map) {
-        map_row(weights.data(), width, output.row(y));
+        mapRow(weights.data(), width, output.row(y));
       } else {
-        mix_row(sharper.row(y), weights.data(), width, output.row(y));
+        mixRow(sharper.row(y), weights.data(), width, output.row(y));
       }
     }
   });
@@ -208,3 +210,5 @@ void deblurFrame(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
 template void deblurFrame(const FramePass<HX_Pixel8>&, WorldX<HX_Pixel8>&);
 template void deblurFrame(const FramePass<HX_Pixel16>&, WorldX<HX_Pixel16>&);
 template void deblurFrame(const FramePass<HX_PixelFloat>&, WorldX<HX_PixelFloat>&);
+
+}  // namespace marrow::render

@@ -4,6 +4,8 @@
 
 #include "stabilizer/render/world.h"
 
+namespace marrow::render {
+
 template <class Pixel>
 struct FramePass;
 
@@ -44,3 +46,5 @@ std::int32_t deblurReach(const DeblurSettings& settings);
 // the same for any number of processors. Throws what the pass's sources and operations throw.
 template <class Pixel>
 void deblurFrame(const FramePass<Pixel>& pass, WorldX<Pixel>& output);
+
+}  // namespace marrow::render

@@ -6,14 +6,15 @@
 #include <type_traits>
 #include <vector>
 
+namespace marrow::render {
 namespace {
 
-std::int32_t whole_pixels(double value, float scale) {
+std::int32_t wholePixels(double value, float scale) {
   return static_cast<std::int32_t>(std::clamp(value * scale + 0.5, 0.0, 1073741824.0));
 }
 
 // By distance, as far as the feather reaches into a frame of that size.
-std::vector<float> feather_factors(float feather, int longer_side) {
+std::vector<float> featherFactors(float feather, int longer_side) {
   const int reach = static_cast<int>(std::clamp(feather + 0.5f, 0.0f, 1073741824.0f));
   std::vector<float> factors(static_cast<std::size_t>(std::min(reach, longer_side)));
   for (std::size_t d = 0; d < factors.size(); ++d) {
@@ -24,7 +25,7 @@ std::vector<float> feather_factors(float feather, int longer_side) {
 }
 
 template <class Pixel>
-void scale_alpha(Pixel* pixels, int count, float factor) {
+void scaleAlpha(Pixel* pixels, int count, float factor) {
   using Alpha = decltype(Pixel::alpha);
   for (int i = 0; i < count; ++i) {
     const float alpha = static_cast<float>(pixels[i].alpha) * factor;
@@ -37,15 +38,15 @@ void scale_alpha(Pixel* pixels, int count, float factor) {
 }
 
 template <class Pixel>
-void clear_alpha(Pixel* pixels, int count) {
+void clearAlpha(Pixel* pixels, int count) {
   for (int i = 0; i < count; ++i) pixels[i].alpha = 0;
 }
 
 }  // namespace
 
 EdgePreparation scaledEdges(const EdgeSettings& edges, float scaleX) {
-  return {whole_pixels(edges.left, scaleX), whole_pixels(edges.top, scaleX),
-          whole_pixels(edges.right, scaleX), whole_pixels(edges.bottom, scaleX),
+  return {wholePixels(edges.left, scaleX), wholePixels(edges.top, scaleX),
+          wholePixels(edges.right, scaleX), wholePixels(edges.bottom, scaleX),
           static_cast<float>(edges.feather * scaleX)};
 }
 
@@ -55,7 +56,7 @@ void prepareEdges(const WorldX<Pixel>& from, const EdgePreparation& edges, World
   const int left = std::min(edges.left, width), top = std::min(edges.top, height);
   const int right = std::max(width - edges.right, left);
   const int bottom = std::max(height - edges.bottom, top);
-  const std::vector<float> factors = feather_factors(edges.feather, std::max(width, height));
+  const std::vector<float> factors = featherFactors(edges.feather, std::max(width, height));
   const int reach = static_cast<int>(factors.size());
   const auto factor = [&factors](int d) { return factors[static_cast<std::size_t>(d)]; };
   // The stretch whose columns are further in than the feather reaches.
@@ -67,20 +68,20 @@ void prepareEdges(const WorldX<Pixel>& from, const EdgePreparation& edges, World
     std::memcpy(static_cast<void*>(row), from.row(y),
                 sizeof(Pixel) * static_cast<std::size_t>(width));
     if (y < top || y >= bottom) {
-      clear_alpha(row, width);
+      clearAlpha(row, width);
       continue;
     }
-    clear_alpha(row, left);
-    clear_alpha(row + right, width - right);
+    clearAlpha(row, left);
+    clearAlpha(row + right, width - right);
     const int dy = std::min(y - top, bottom - y);
-    const auto feather_columns = [&](int begin, int end) {
+    const auto featherColumns = [&](int begin, int end) {
       for (int x = begin; x < end; ++x) {
-        scale_alpha(row + x, 1, factor(std::min({x - left, right - x, dy})));
+        scaleAlpha(row + x, 1, factor(std::min({x - left, right - x, dy})));
       }
     };
-    feather_columns(left, inner_left);
-    if (dy < reach) scale_alpha(row + inner_left, inner_right - inner_left, factor(dy));
-    feather_columns(inner_right, right);
+    featherColumns(left, inner_left);
+    if (dy < reach) scaleAlpha(row + inner_left, inner_right - inner_left, factor(dy));
+    featherColumns(inner_right, right);
   }
 }
 
@@ -109,3 +110,5 @@ CALMFRAME_INSTANTIATE(HX_Pixel8)
 CALMFRAME_INSTANTIATE(HX_Pixel16)
 CALMFRAME_INSTANTIATE(HX_PixelFloat)
 #undef CALMFRAME_INSTANTIATE
+
+}  // namespace marrow::render

@@ -6,6 +6,8 @@
 
 #include "stabilizer/render/source_frames.h"
 
+namespace marrow::render {
+
 // What is taken off the sides of every source frame before it is drawn, in pixels of the full-size
 // frame, 0 or more.
 struct EdgeSettings {
@@ -65,3 +67,5 @@ class PreparedSources final : public SourceFrames<Pixel> {
 extern template class PreparedSources<HX_Pixel8>;
 extern template class PreparedSources<HX_Pixel16>;
 extern template class PreparedSources<HX_PixelFloat>;
+
+}  // namespace marrow::render

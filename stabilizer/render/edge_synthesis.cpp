@@ -4,10 +4,11 @@
 #include <cmath>
 #include <optional>
 
+namespace marrow::render {
 namespace {
 
 template <class Pixel>
-bool is_open(const WorldX<Pixel>& world, const pixel_rect& rect) {
+bool isOpen(const WorldX<Pixel>& world, const pixel_rect& rect) {
   for (int y = rect.top; y < rect.bottom; ++y) {
     const Pixel* row = world.row(y);
     for (int x = rect.left; x < rect.right; ++x) {
@@ -19,7 +20,7 @@ bool is_open(const WorldX<Pixel>& world, const pixel_rect& rect) {
 
 // A rounded sample may keep its colours without any alpha. Composing leaves none of them.
 template <class Pixel>
-void clear_hidden_colours(WorldX<Pixel>& world, const pixel_rect& rect) {
+void clearHiddenColours(WorldX<Pixel>& world, const pixel_rect& rect) {
   for (int y = rect.top; y < rect.bottom; ++y) {
     Pixel* row = world.row(y);
     for (int x = rect.left; x < rect.right; ++x) {
@@ -30,13 +31,13 @@ void clear_hidden_colours(WorldX<Pixel>& world, const pixel_rect& rect) {
 
 // The part of a buffer that a rectangle covers.
 template <class Pixel>
-WorldX<Pixel> part_of(WorldX<Pixel>& world, const pixel_rect& rect) {
+WorldX<Pixel> partOf(WorldX<Pixel>& world, const pixel_rect& rect) {
   return {rect.right - rect.left, rect.bottom - rect.top, world.row_bytes(),
           world.row(rect.top) + rect.left};
 }
 
 template <class Pixel>
-void boost_alpha(WorldX<Pixel>& world, const pixel_rect& rect, int times) {
+void boostAlpha(WorldX<Pixel>& world, const pixel_rect& rect, int times) {
   using Alpha = decltype(Pixel::alpha);
   constexpr Alpha full = world_view<Pixel>::full;
   using Product = decltype(full + 1);
@@ -57,7 +58,7 @@ void synthesizeEdges(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
   TileMap open(output.width(), output.height());
   open.add(0, 0, output.width(), output.height());
   const auto close = [&] {
-    open.filter([&output](const pixel_rect& tile) { return is_open(output, tile); });
+    open.filter([&output](const pixel_rect& tile) { return isOpen(output, tile); });
   };
   close();
 
@@ -74,7 +75,7 @@ void synthesizeEdges(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
         meshOfFrame(pass, static_cast<std::size_t>(M), output.width(), output.height());
     if (!mesh) continue;
     if (!composes) {
-      for (const pixel_rect& part : open.rects()) clear_hidden_colours(output, part);
+      for (const pixel_rect& part : open.rects()) clearHiddenColours(output, part);
       composes = true;
     }
     TileMap shown = mesh->tiles();
@@ -85,19 +86,21 @@ void synthesizeEdges(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
     const boost::shared_ptr<const WorldX<Pixel>> source =
         pass.sources.Fetch(static_cast<std::size_t>(M));
     if (!layer) layer.emplace(output.width(), output.height());
-    for (const pixel_rect& part : parts) part_of(*layer, part).clear();
+    for (const pixel_rect& part : parts) partOf(*layer, part).clear();
     drawMesh(*mesh, *source, *layer, &shown);
     for (const pixel_rect& part : parts) {
-      pass.operations.TransferBehind(part_of(*layer, part), part.left, part.top, output);
+      pass.operations.TransferBehind(partOf(*layer, part), part.left, part.top, output);
     }
     close();
   }
 
   const long boost = std::lround(pass.settings.alpha_boost);
   if (boost < 2) return;
-  for (const pixel_rect& part : open.rects()) boost_alpha(output, part, static_cast<int>(boost));
+  for (const pixel_rect& part : open.rects()) boostAlpha(output, part, static_cast<int>(boost));
 }
 
 template void synthesizeEdges(const FramePass<HX_Pixel8>&, WorldX<HX_Pixel8>&);
 template void synthesizeEdges(const FramePass<HX_Pixel16>&, WorldX<HX_Pixel16>&);
 template void synthesizeEdges(const FramePass<HX_PixelFloat>&, WorldX<HX_PixelFloat>&);
+
+}  // namespace marrow::render

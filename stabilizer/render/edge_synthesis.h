@@ -1,6 +1,8 @@
 #pragma once
 
-#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/frame_pass.h"
+
+namespace marrow::render {
 
 // Fills what the pass's frame, drawn before, leaves open of `output` with its neighbours, each as
 // it lies in that frame: those next to it first, the one behind before the one in front, as far as
@@ -17,3 +19,5 @@ void synthesizeEdges(const FramePass<Pixel>& pass, WorldX<Pixel>& output);
 extern template void synthesizeEdges(const FramePass<HX_Pixel8>&, WorldX<HX_Pixel8>&);
 extern template void synthesizeEdges(const FramePass<HX_Pixel16>&, WorldX<HX_Pixel16>&);
 extern template void synthesizeEdges(const FramePass<HX_PixelFloat>&, WorldX<HX_PixelFloat>&);
+
+}  // namespace marrow::render

@@ -5,7 +5,9 @@
 #include <limits>
 #include <utility>
 
-using marrow::stabilization::point2;
+namespace marrow::render {
+
+using stabilization::point2;
 
 namespace {
 
@@ -83,3 +85,5 @@ TileMap FrameMesh::tiles() const {
   }
   return tiles;
 }
+
+}  // namespace marrow::render

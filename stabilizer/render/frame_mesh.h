@@ -5,8 +5,10 @@
 
 #include "stabilization/crop/cropper.h"
 #include "stabilization/models/matrix3.h"
-#include "stabilizer/render/renderer.h"
+#include "stabilizer/render/render_geometry.h"
 #include "stabilizer/render/tile_map.h"
+
+namespace marrow::render {
 
 // One frame's mesh as it lies in a destination of width x height pixels: the warped grid in the
 // zoomed output plane, and the plane's place.
@@ -33,8 +35,8 @@ class FrameMesh {
     std::int64_t y1;
   };
 
-  static bool usable(marrow::stabilization::point2 p);
-  marrow::stabilization::point2 vertex(std::int32_t c, std::int32_t r) const {
+  static bool usable(stabilization::point2 p);
+  stabilization::point2 vertex(std::int32_t c, std::int32_t r) const {
     const std::size_t i =
         2 * (static_cast<std::size_t>(r) * static_cast<std::size_t>(renderer_.cols) +
              static_cast<std::size_t>(c));
@@ -57,3 +59,5 @@ class FrameMesh {
   double limit_y_;
   std::vector<row_extent> extents_;  // of each grid row's finite vertices
 };
+
+}  // namespace marrow::render

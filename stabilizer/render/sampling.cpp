@@ -16,7 +16,7 @@
 #include <hwy/highway.h>
 
 HWY_BEFORE_NAMESPACE();
-namespace sampling {
+namespace marrow::render::sampling {
 namespace HWY_NAMESPACE {
 namespace hn = hwy::HWY_NAMESPACE;
 
@@ -500,10 +500,11 @@ void RunsFloat(const source_plane& source, const source_run<HX_PixelFloat>* runs
 }
 
 }  // namespace HWY_NAMESPACE
-}  // namespace sampling
+}  // namespace marrow::render::sampling
 HWY_AFTER_NAMESPACE();
 
 #if HWY_ONCE
+namespace marrow::render {
 namespace sampling {
 HWY_EXPORT(Runs8);
 HWY_EXPORT(Runs16);
@@ -522,4 +523,6 @@ void SampleRuns(const source_plane& source, const source_run<HX_PixelFloat>* run
   using namespace sampling;
   HWY_DYNAMIC_DISPATCH(RunsFloat)(source, runs, n);
 }
+
+}  // namespace marrow::render
 #endif

@@ -5,6 +5,7 @@
 #include "platform/hx/hx_pixel.h"
 
 // Bilinear samples of a source along straight runs of output pixels.
+namespace marrow::render {
 
 // Source position of pixel k of a run, k = 0 .. count - 1: x + k * dx / (1 + g * k), and the same
 // for y. It is the exact form of a projective map along a row.
@@ -38,3 +39,5 @@ inline constexpr int max_run = 64;
 void SampleRuns(const source_plane& source, const source_run<HX_Pixel8>* runs, std::size_t n);
 void SampleRuns(const source_plane& source, const source_run<HX_Pixel16>* runs, std::size_t n);
 void SampleRuns(const source_plane& source, const source_run<HX_PixelFloat>* runs, std::size_t n);
+
+}  // namespace marrow::render

@@ -5,6 +5,8 @@
 
 #include "stabilizer/render/world.h"
 
+namespace marrow::render {
+
 // Where source frames come from: the analysed clip's frame `frame`, at the render's scale. Failures
 // are thrown and leave the render.
 template <class Pixel>
@@ -13,3 +15,5 @@ class SourceFrames {
   virtual ~SourceFrames() = default;
   virtual boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) = 0;
 };
+
+}  // namespace marrow::render

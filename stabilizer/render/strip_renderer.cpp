@@ -7,8 +7,10 @@
 #include <limits>
 #include <tuple>
 
-using marrow::stabilization::matrix3;
-using marrow::stabilization::point2;
+namespace marrow::render {
+
+using stabilization::matrix3;
+using stabilization::point2;
 
 namespace {
 
@@ -102,7 +104,7 @@ struct StripRenderer<Pixel>::band_runs {
   };
 
   // Joins what follows right on.
-  void Add(int y, int x0, int x1) {
+  void add(int y, int x0, int x1) {
     if (!spans.empty() && spans.back().y == y && spans.back().x1 == x0) {
       spans.back().x1 = x1;
     } else {
@@ -191,17 +193,17 @@ void StripRenderer<Pixel>::clearRest(int first, int end, band_runs& runs) const 
   auto next = runs.spans.begin();
   for (int y = first; y < end; ++y) {
     int x = 0;
-    const auto clear_to = [&](int x1) {
+    const auto clearTo = [&](int x1) {
       if (x1 > x) {
         std::memset(static_cast<void*>(destination_.row(y) + x), 0,
                     sizeof(Pixel) * static_cast<std::size_t>(x1 - x));
       }
     };
     for (; next != runs.spans.end() && next->y == y; ++next) {
-      clear_to(next->x0);
+      clearTo(next->x0);
       x = std::max(x, next->x1);
     }
-    clear_to(destination_.width());
+    clearTo(destination_.width());
   }
 }
 
@@ -283,7 +285,7 @@ bool StripRenderer<Pixel>::setUpCell(std::int32_t c, std::int32_t r, std::int64_
        x1,
        y0,
        y1,
-       marrow::stabilization::inverse(marrow::stabilization::square_to_quad(p00, p10, p01, p11)),
+       stabilization::inverse(stabilization::square_to_quad(p00, p10, p01, p11)),
        {between(p00, p10), between(p10, p11), between(p11, p01), between(p01, p00)},
        {top, right, bottom, left},
        border};
@@ -294,7 +296,7 @@ bool StripRenderer<Pixel>::setUpCell(std::int32_t c, std::int32_t r, std::int64_
 
 template <class Pixel>
 void StripRenderer<Pixel>::drawRow(const cell& q, std::int64_t y, band_runs& runs) const {
-  if (!(plane_y(y) < renderer_.planeHeight)) return;
+  if (!(planeY(y) < renderer_.planeHeight)) return;
   const double test_y = static_cast<double>(y) / zoom_;
   const double* test_x = test_x_.data() + to_destination_x_;
 
@@ -332,7 +334,7 @@ void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t
   const double* plane_x = plane_x_.data() + to_destination_x_;
   while (x0 < x1 && !(plane_x[x1 - 1] < renderer_.planeWidth)) --x1;
   if (x0 >= x1) return;
-  runs.Add(static_cast<int>(y + to_destination_y_), static_cast<int>(x0 + to_destination_x_),
+  runs.add(static_cast<int>(y + to_destination_y_), static_cast<int>(x0 + to_destination_x_),
            static_cast<int>(x1 + to_destination_x_));
   for (std::int64_t x = x0; x < x1; x += max_run) {
     runs.runs[runs.count++] = {&q, x, static_cast<int>(std::min<std::int64_t>(max_run, x1 - x))};
@@ -344,7 +346,7 @@ void StripRenderer<Pixel>::drawSpan(const cell& q, std::int64_t x0, std::int64_t
 // spans, whose branches are hard to foretell.
 template <class Pixel>
 void StripRenderer<Pixel>::sample(std::int64_t y, band_runs& runs) const {
-  const double py = plane_y(y);
+  const double py = planeY(y);
   const double* plane_x = plane_x_.data() + to_destination_x_;
   Pixel* row = destination_.row(static_cast<int>(y + to_destination_y_)) + to_destination_x_;
   std::array<source_run<Pixel>, std::tuple_size_v<decltype(runs.runs)>> placed;
@@ -372,3 +374,5 @@ void StripRenderer<Pixel>::sample(std::int64_t y, band_runs& runs) const {
 template class StripRenderer<HX_Pixel8>;
 template class StripRenderer<HX_Pixel16>;
 template class StripRenderer<HX_PixelFloat>;
+
+}  // namespace marrow::render

@@ -8,6 +8,8 @@
 #include "stabilizer/render/sampling.h"
 #include "stabilizer/render/world.h"
 
+namespace marrow::render {
+
 // Draws one frame's mesh: each cell of the warped grid is a quadrilateral of the zoomed output
 // plane whose pixels look up the source through the inverse of the cell's projective map.
 //
@@ -40,7 +42,7 @@ class StripRenderer : FrameMesh {
   void drawSpan(const cell& q, std::int64_t x0, std::int64_t x1, std::int64_t y,
                 band_runs& runs) const;
   void sample(std::int64_t y, band_runs& runs) const;
-  double plane_y(std::int64_t y) const { return (static_cast<double>(y) + offset_y_) / zoom_; }
+  double planeY(std::int64_t y) const { return (static_cast<double>(y) + offset_y_) / zoom_; }
 
   WorldX<Pixel>& destination_;
   const TileMap* only_;
@@ -56,3 +58,5 @@ class StripRenderer : FrameMesh {
 extern template class StripRenderer<HX_Pixel8>;
 extern template class StripRenderer<HX_Pixel16>;
 extern template class StripRenderer<HX_PixelFloat>;
+
+}  // namespace marrow::render

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+namespace marrow::render {
+
 bool TileMap::empty() const {
   return std::all_of(tiles_.begin(), tiles_.end(), [](std::uint8_t t) { return t == 0; });
 }
@@ -68,3 +70,5 @@ std::vector<pixel_rect> TileMap::rects() const {
   }
   return all;
 }
+
+}  // namespace marrow::render

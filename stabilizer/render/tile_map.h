@@ -4,6 +4,8 @@
 #include <cstdint>
 #include <vector>
 
+namespace marrow::render {
+
 // A rectangle of pixels, half-open.
 struct pixel_rect {
   int left;
@@ -71,3 +73,5 @@ class TileMap {
   int rows_;
   std::vector<std::uint8_t> tiles_;
 };
+
+}  // namespace marrow::render

@@ -14,6 +14,8 @@
 
 #include "platform/hx/hx_world.h"
 
+namespace marrow::render {
+
 // The gil view of a frame of `Pixel`, how the host calls its format, and what is full.
 template <class Pixel>
 struct world_view;
@@ -97,7 +99,7 @@ class WorldX {
 // The same pixels as the host's operations take them, at origin 0; to be read only, if the world
 // is.
 template <class Pixel>
-HX_World WorldOf(const WorldX<Pixel>& world) {
+HX_World world_of(const WorldX<Pixel>& world) {
   HX_World record{};
   record.data = const_cast<Pixel*>(world.data());
   record.row_bytes = static_cast<std::int32_t>(world.row_bytes());
@@ -111,3 +113,5 @@ HX_World WorldOf(const WorldX<Pixel>& world) {
 
 // How a frame is composed behind another, at full opacity.
 inline constexpr HX_TransferMode kBehind{HX_TRANSFER_BEHIND, 0, 255, 0, 32768};
+
+}  // namespace marrow::render

@@ -4,13 +4,15 @@
 
 #include "stabilization/solver_params.h"
 #include "stabilizer/effect/src/table_reader.h"
-#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/framing.h"
 #include "tracking/selector_params.h"
 #include "tracking/tracker_params.h"
 
 // How parameters become the record of a solve, and how the few controls that a person sees become
 // parameters.
 namespace kelp::effect {
+
+using marrow::render::Framing;
 
 // The controls that a person sees, with their defaults. Percentages as shown: 50 is 50 %.
 struct Controls {

@@ -13,9 +13,14 @@
 #include "effect/suite.h"
 #include "effect/world.h"
 #include "stabilizer/effect/src/frame_time.h"
-#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/source_frames.h"
+#include "stabilizer/render/world_operations.h"
 
 namespace kelp::effect {
+
+using marrow::render::SourceFrames;
+using marrow::render::WorldOperations;
+using marrow::render::WorldX;
 
 // Where a render gets its frames. They are the host's, and stay as long as their pointers. Failures
 // are the host's codes, thrown.
@@ -117,15 +122,16 @@ class HostOperations final : public WorldOperations<Pixel> {
   explicit HostOperations(const HostContext& context) : context_(context) {}
 
   void TransferBehind(const WorldX<Pixel>& from, int x, int y, WorldX<Pixel>& to) override {
-    const HX_World source = WorldOf(from);
-    HX_World target = WorldOf(to);
+    const HX_World source = world_of(from);
+    HX_World target = world_of(to);
     const HX_InData& in = *context_.in;
-    ThrowIfFailed(in.cb->transfer(in.effect_ref, &source, &kBehind, nullptr, x, y, &target));
+    ThrowIfFailed(
+        in.cb->transfer(in.effect_ref, &source, &marrow::render::kBehind, nullptr, x, y, &target));
   }
   void Blur(const WorldX<Pixel>& from, WorldX<Pixel>& to, float radius) override {
     constexpr std::int32_t kPasses = 1, kMode = 110, kFlag = 1;
-    const HX_World source = WorldOf(from);
-    HX_World target = WorldOf(to);
+    const HX_World source = world_of(from);
+    HX_World target = world_of(to);
     const ScopedSuite<HX_BlurSuite1> suite(context_);
     ThrowIfFailed(
         suite->Blur(context_.in->effect_ref, &source, &target, radius, kPasses, kMode, 0, kFlag));

@@ -5,6 +5,9 @@
 
 namespace kelp::effect {
 
+using marrow::render::DeblurDebug;
+using marrow::render::DeblurSettings;
+
 namespace {
 
 DeblurSettings GetDeblurSettings(const ParameterReader& params) {

@@ -4,10 +4,12 @@
 
 #include "effect/parameter_reader.h"
 #include "stabilizer/effect/src/parameter_rules.h"
-#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/render_settings.h"
 
 // How parameters become the settings of a render.
 namespace kelp::effect {
+
+using marrow::render::RenderSettings;
 
 // How the parameters ask for frames to be drawn; the synthesis range is MarginInFrames's to tell.
 RenderSettings GetRenderSettings(const ParameterReader& params);

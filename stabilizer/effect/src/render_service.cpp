@@ -11,6 +11,7 @@
 #include "stabilizer/effect/src/parameter_table.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "stabilizer/render/cp_warper_warps.h"
+#include "stabilizer/render/frame_renderer.h"
 
 // StabilizerEffect's renders. Each works on the state of its own thread's instance, which took over
 // what the user interface published before the frame was set up.
@@ -20,6 +21,7 @@ using analysis::FrameStatus;
 using analysis::effect::CurrentFrame;
 using analysis::effect::EffectParameters;
 using analysis::effect::StatusRecord;
+using marrow::render::CPWarperWarps;
 
 namespace {
 
@@ -104,9 +106,9 @@ Renderer StabilizerEffect::MakeRenderer(const StabilizerState& state) const {
   const HX_InData& in = *context().in;
   const double pixel_aspect = static_cast<double>(state.warper->frameWidth()) /
                               std::max(state.source_width, std::int32_t{1});
-  return ::MakeRenderer(CPWarperWarps(state.warper),
-                        static_cast<float>(ValueOfRatio(in.downsample_x) / pixel_aspect),
-                        static_cast<float>(ValueOfRatio(in.downsample_y)));
+  return marrow::render::makeRenderer(
+      CPWarperWarps(state.warper), static_cast<float>(ValueOfRatio(in.downsample_x) / pixel_aspect),
+      static_cast<float>(ValueOfRatio(in.downsample_y)));
 }
 
 OutputRect StabilizerEffect::SetUpOutput() {

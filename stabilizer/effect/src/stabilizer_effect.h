@@ -3,8 +3,11 @@
 #include "analysis/effect/analysis_effect.h"
 #include "stabilizer/effect/src/render_frames.h"
 #include "stabilizer/effect/src/stabilizer_state.h"
+#include "stabilizer/render/output_rect.h"
 
 namespace kelp::effect {
+
+using marrow::render::OutputRect;
 
 // The stabilizer: what follows an analysis. The start and the watch of a solve, whether a change
 // calls for a solve or for a new crop alone, the state of an instance and its handle, the block

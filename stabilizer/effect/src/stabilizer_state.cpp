@@ -7,11 +7,13 @@
 
 #include "stabilizer/effect/src/solve_hash.h"
 #include "stabilizer/render/cp_warper_warps.h"
+#include "stabilizer/render/output_rect.h"
 
 namespace kelp::effect {
 
 using analysis::FrameStatus;
 using analysis::effect::DeletedTrackPoints;
+using marrow::render::CPWarperWarps;
 using marrow::stabilization::SolverParamsRecord;
 using marrow::tracking::AllFeatures;
 using tessel::utility::Guid;
@@ -169,7 +171,7 @@ double StabilizerState::GetZoom(const ParameterReader& params, Renderer& rendere
   RenderSettings settings = GetRenderSettings(params);
   if (!use_additional_scale) settings.additional_scale = 1.0f;
   if (!auto_scale) return settings.additional_scale;
-  return ::GetZoom(CPWarperWarps(warper), crop.get(), settings, renderer);
+  return marrow::render::getZoom(CPWarperWarps(warper), crop.get(), settings, renderer);
 }
 
 bool StabilizerState::IsOverCropped(const ParameterReader& params) const {
@@ -177,7 +179,7 @@ bool StabilizerState::IsOverCropped(const ParameterReader& params) const {
   const RenderSettings settings = GetRenderSettings(params);
   if (!crops(settings.framing)) return false;
   const CPWarperWarps warps(warper);
-  Renderer renderer = MakeRenderer(warps, 1.0f, 1.0f);
+  Renderer renderer = makeRenderer(warps, 1.0f, 1.0f);
   return isOvercropped(warps, *crop, settings, renderer);
 }
 

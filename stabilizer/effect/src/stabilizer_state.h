@@ -17,7 +17,7 @@
 #include "stabilizer/effect/src/solve_phase.h"
 #include "stabilizer/effect/src/solver.h"
 #include "stabilizer/effect/src/state_format/saved_state.h"
-#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/render_geometry.h"
 
 namespace kelp::effect {
 

@@ -8,11 +8,14 @@
 #include <random>
 #include <set>
 
-#include "tests/stabilizer/render/plain_operations.h"
+#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/output_rect.h"
+#include "tests/stabilizer/render/pixel_operations.h"
 
-using marrow::stabilization::frame_bounds;
-using marrow::stabilization::point2;
-using marrow::stabilization::VarVector;
+namespace marrow::render {
+using stabilization::frame_bounds;
+using stabilization::point2;
+using stabilization::VarVector;
 
 namespace {
 
@@ -78,8 +81,8 @@ WorldX<Pixel> Render(const Clip& clip, Frames<Pixel>& frames, std::size_t frame,
   RenderSettings settings;
   settings.framing = Framing::synthesize_edges;
   settings.deblur = deblur;
-  Renderer renderer = MakeRenderer(clip, 1, 1);
-  PlainOperations<Pixel> operations;
+  Renderer renderer = makeRenderer(clip, 1, 1);
+  PixelOperations<Pixel> operations;
   WorldX<Pixel> output(kWidth, kHeight);
   frames.fetched.clear();
   EXPECT_TRUE(renderFrame(clip, nullptr, settings, renderer, frame, frames, operations, output));
@@ -319,7 +322,7 @@ TYPED_TEST(DeblurPicture, IsWhatTheStepsGiveOneByOne) {
   };
   const WorldX<Pixel> out = Render(this->clip, this->frames, 3, {});
   const WorldX<Pixel> sharper = render(DeblurDebug::sharper_frame, false);
-  PlainOperations<Pixel> operations;
+  PixelOperations<Pixel> operations;
   WorldX<Pixel> b(kWidth, kHeight), c(kWidth, kHeight);
   operations.Blur(sharper, b, 2);
   operations.Blur(out, c, 2);
@@ -352,3 +355,4 @@ TYPED_TEST(DeblurPicture, IsWhatTheStepsGiveOneByOne) {
 }
 
 }  // namespace
+}  // namespace marrow::render

@@ -7,6 +7,7 @@
 #include <random>
 #include <vector>
 
+namespace marrow::render {
 namespace {
 
 template <class Pixel>
@@ -128,3 +129,4 @@ TEST(PreparedSources, EachFrameIsPreparedOnceThoughTwoAreHeld) {
 }
 
 }  // namespace
+}  // namespace marrow::render

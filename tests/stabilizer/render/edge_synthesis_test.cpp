@@ -10,12 +10,14 @@
 #include <random>
 #include <set>
 
-#include "pipeline/host_operations.h"
-#include "tests/stabilizer/render/plain_operations.h"
+#include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/output_rect.h"
+#include "tests/stabilizer/render/pixel_operations.h"
 
-using marrow::stabilization::frame_bounds;
-using marrow::stabilization::point2;
-using marrow::stabilization::VarVector;
+namespace marrow::render {
+using stabilization::frame_bounds;
+using stabilization::point2;
+using stabilization::VarVector;
 
 namespace {
 
@@ -131,8 +133,7 @@ TYPED_TEST_SUITE(EdgeSynthesis, Depths);
 TYPED_TEST(EdgeSynthesis, WhatIsNotDrawnWouldNotHaveShown) {
   std::mt19937 random(11);
   const auto within = [&](double a) { return a * (random() % 2001 / 1000.0 - 1); };
-  PlainOperations<TypeParam> plain;
-  calmframe::pipeline::HostOperations<TypeParam> host;
+  PixelOperations<TypeParam> operations;
   for (int run = 0; run < 30; ++run) {
     SCOPED_TRACE(run);
     Shot shot(190, 140, 9, 7);
@@ -144,7 +145,7 @@ TYPED_TEST(EdgeSynthesis, WhatIsNotDrawnWouldNotHaveShown) {
       bare.worlds.push_back(patches<TypeParam>(190, 140, 100 * run + f, opaque));
     }
     if (run % 4 == 0) shot.without_motion = {1, 5};
-    Renderer renderer = MakeRenderer(shot, 1, 1);
+    Renderer renderer = makeRenderer(shot, 1, 1);
     RenderSettings settings;
     settings.framing = Framing::synthesize_edges;
     settings.synthesis_range = run % 5 == 0 ? 3 : 20;
@@ -162,8 +163,6 @@ TYPED_TEST(EdgeSynthesis, WhatIsNotDrawnWouldNotHaveShown) {
     WorldX<TypeParam> found(width, height, row_bytes, found_pixels.data());
     WorldX<TypeParam> expected(width, height, row_bytes, plain_pixels.data());
     const std::size_t frame = run < 2 ? 8 * run : random() % 9;
-    WorldOperations<TypeParam>& operations =
-        run % 2 ? static_cast<WorldOperations<TypeParam>&>(host) : plain;
 
     bare.asked.clear();
     ASSERT_TRUE(
@@ -208,7 +207,7 @@ class Stripes {
   }
   // The middle row.
   std::vector<HX_PixelFloat> Row(std::size_t frame) {
-    Renderer renderer = MakeRenderer(shot, 1, 1);
+    Renderer renderer = makeRenderer(shot, 1, 1);
     WorldX<HX_PixelFloat> output(renderer.planeWidth, renderer.planeHeight);
     frames.asked.clear();
     EXPECT_TRUE(renderFrame<HX_PixelFloat>(shot, nullptr, settings, renderer, frame, frames,
@@ -223,7 +222,7 @@ class Stripes {
 
   Shot shot;
   Frames<HX_PixelFloat> frames;
-  PlainOperations<HX_PixelFloat> operations;
+  PixelOperations<HX_PixelFloat> operations;
   RenderSettings settings;
 };
 
@@ -268,11 +267,11 @@ TEST(EdgeSynthesisOrder, ANeighbourThatReachesNothingOpenIsNotFetched) {
   shot.Add({30, 0});
   shot.Add({300, 0});  // far away
   for (int f = 0; f < 4; ++f) frames.worlds.push_back(patches<HX_Pixel8>(200, 200, f, true));
-  Renderer renderer = MakeRenderer(shot, 1, 1);
+  Renderer renderer = makeRenderer(shot, 1, 1);
   RenderSettings settings;
   settings.framing = Framing::synthesize_edges;
   settings.synthesis_range = 3;
-  PlainOperations<HX_Pixel8> operations;
+  PixelOperations<HX_Pixel8> operations;
   WorldX<HX_Pixel8> output(renderer.planeWidth - 150, renderer.planeHeight);
   settings.shift_x = 0;
   ASSERT_TRUE(
@@ -353,3 +352,4 @@ TEST(TileMaps, RectanglesCoverTheSetOnce) {
 }
 
 }  // namespace
+}  // namespace marrow::render

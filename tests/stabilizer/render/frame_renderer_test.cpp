@@ -1,4 +1,5 @@
 #include "stabilizer/render/frame_renderer.h"
+#include "stabilizer/render/output_rect.h"
 
 #include <gtest/gtest.h>
 #include <tbb/global_control.h>
@@ -9,16 +10,17 @@
 #include <limits>
 #include <random>
 
-#include "tests/stabilizer/render/plain_operations.h"
+#include "tests/stabilizer/render/pixel_operations.h"
 #include "tests/support/each_instruction_set.h"
 
-using marrow::stabilization::frame_bounds;
-using marrow::stabilization::inverse;
-using marrow::stabilization::matrix3;
-using marrow::stabilization::point2;
-using marrow::stabilization::square_to_quad;
-using marrow::stabilization::transform;
-using marrow::stabilization::VarVector;
+namespace marrow::render {
+using stabilization::frame_bounds;
+using stabilization::inverse;
+using stabilization::matrix3;
+using stabilization::point2;
+using stabilization::square_to_quad;
+using stabilization::transform;
+using stabilization::VarVector;
 
 namespace {
 
@@ -230,10 +232,10 @@ template <class Pixel>
 void expect_as_plain(const scene& s) {
   Clip clip(s.width, s.height, s.cols, s.rows, s.to);
   s.damage(clip);
-  Renderer R = MakeRenderer(clip, s.scale, s.scale);
+  Renderer R = makeRenderer(clip, s.scale, s.scale);
   const auto source = textured<Pixel>(R.sourceWidth, R.sourceHeight, s.alpha);
   OneFrame<Pixel> frames(source);
-  PlainOperations<Pixel> operations;
+  PixelOperations<Pixel> operations;
   cropper crop(1, 1, 1);
   crop.rects[0] = {4, s.width - 7.0f, 3, s.height - 6.0f};
   crop.cropWidth = s.width - 10;
@@ -258,7 +260,7 @@ void expect_as_plain(const scene& s) {
   } else {
     rect = {0, R.planeWidth - 1.0f, 0, R.planeHeight - 1.0f};
   }
-  const double zoom = GetZoom(clip, &crop, settings, R);
+  const double zoom = getZoom(clip, &crop, settings, R);
   const std::vector<sample> expected =
       plain_render(R, vertices, *source, out_w, out_h, rect, zoom, crops(s.framing));
   double worst = 0;
@@ -345,7 +347,7 @@ TYPED_TEST(FrameRenderer, BrokenMeshes) {
 
 TYPED_TEST(FrameRenderer, IdentityIsTheSourceAtHalfPixels) {
   Clip clip(40, 30, 4, 3, [](double x, double y) { return point2{x, y}; });
-  Renderer R = MakeRenderer(clip, 1, 1);
+  Renderer R = makeRenderer(clip, 1, 1);
   const auto source = boost::make_shared<WorldX<TypeParam>>(40, 30);
   const double unit = depth<TypeParam>::full / 256;
   for (int y = 0; y < 30; ++y) {
@@ -355,7 +357,7 @@ TYPED_TEST(FrameRenderer, IdentityIsTheSourceAtHalfPixels) {
     }
   }
   OneFrame<TypeParam> frames(source);
-  PlainOperations<TypeParam> operations;
+  PixelOperations<TypeParam> operations;
   RenderSettings settings;
   settings.framing = Framing::stabilize_only;
   WorldX<TypeParam> out(R.planeWidth, R.planeHeight);
@@ -370,9 +372,9 @@ TYPED_TEST(FrameRenderer, IdentityIsTheSourceAtHalfPixels) {
 TYPED_TEST(FrameRenderer, InstructionSetNeverShows) {
   for (const alphas a : {alphas::full, alphas::edges}) {
     Clip clip(403, 57, 9, 4, turned);
-    Renderer R = MakeRenderer(clip, 1, 1);
+    Renderer R = makeRenderer(clip, 1, 1);
     OneFrame<TypeParam> frames(textured<TypeParam>(403, 57, a));
-    PlainOperations<TypeParam> operations;
+    PixelOperations<TypeParam> operations;
     RenderSettings settings;
     settings.framing = Framing::stabilize_only;
     std::vector<unsigned char> first;
@@ -390,9 +392,9 @@ TYPED_TEST(FrameRenderer, InstructionSetNeverShows) {
 TYPED_TEST(FrameRenderer, ThreadCountNeverShows) {
   Clip clip(320, 240, 20, 15, turned);
   clip.set(7, 7, {60, 190});  // overlapping cells across many bands
-  Renderer R = MakeRenderer(clip, 1, 1);
+  Renderer R = makeRenderer(clip, 1, 1);
   OneFrame<TypeParam> frames(textured<TypeParam>(320, 240, alphas::edges));
-  PlainOperations<TypeParam> operations;
+  PixelOperations<TypeParam> operations;
   RenderSettings settings;
   settings.framing = Framing::stabilize_only;
   WorldX<TypeParam> one(R.planeWidth, R.planeHeight), many(R.planeWidth, R.planeHeight);
@@ -410,7 +412,7 @@ TYPED_TEST(FrameRenderer, ThreadCountNeverShows) {
 
 TEST(FrameRendererAlpha, ColourOfTransparentPixelsDoesNotShow) {
   Clip clip(16, 16, 3, 3, [](double x, double y) { return point2{x, y}; });
-  Renderer R = MakeRenderer(clip, 1, 1);
+  Renderer R = makeRenderer(clip, 1, 1);
   const auto source = boost::make_shared<WorldX<HX_Pixel8>>(16, 16);
   for (int y = 0; y < 16; ++y) {
     for (int x = 0; x < 16; ++x) {
@@ -418,7 +420,7 @@ TEST(FrameRendererAlpha, ColourOfTransparentPixelsDoesNotShow) {
     }
   }
   OneFrame<HX_Pixel8> frames(source);
-  PlainOperations<HX_Pixel8> operations;
+  PixelOperations<HX_Pixel8> operations;
   RenderSettings settings;
   settings.framing = Framing::stabilize_only;
   WorldX<HX_Pixel8> out(R.planeWidth, R.planeHeight);
@@ -430,7 +432,7 @@ TEST(FrameRendererAlpha, ColourOfTransparentPixelsDoesNotShow) {
 
 TEST(Overcropped, UnderTwoFifthsAsShown) {
   Clip clip(1920, 1080, 3, 3, [](double x, double y) { return point2{x, y}; });
-  Renderer R = MakeRenderer(clip, 1, 1);
+  Renderer R = makeRenderer(clip, 1, 1);
   const auto overcropped = [&](int width, int height, Framing framing) {
     cropper crop(1, 1920, 1080);
     crop.cropWidth = width;
@@ -447,7 +449,7 @@ TEST(Overcropped, UnderTwoFifthsAsShown) {
 
 TEST(SetupOutput, TheWholePlaneWithoutACrop) {
   Clip clip(100, 80, 3, 3, [](double x, double y) { return point2{x * 1.1 - 8, y - 3.5}; });
-  const Renderer R = MakeRenderer(clip, 1, 1);
+  const Renderer R = makeRenderer(clip, 1, 1);
   const OutputRect all = setupOutputRect(Framing::stabilize_only, R, 100, 80);
   EXPECT_EQ(all.width, 109);  // 99 * 1.1 = 108.9
   EXPECT_EQ(all.height, 79);
@@ -460,7 +462,7 @@ TEST(SetupOutput, TheWholePlaneWithoutACrop) {
 
 TEST(OutlinePolygon, GoesAroundTheBuffer) {
   Clip clip(101, 81, 3, 3, [](double x, double y) { return point2{x + 7, y - 5}; });
-  const Renderer R = MakeRenderer(clip, 1, 1);
+  const Renderer R = makeRenderer(clip, 1, 1);
   const std::vector<float> p = outlinePolygon(clip, 0, R, {}, 0, 0);
   ASSERT_EQ(p.size(), 24u);
   EXPECT_FLOAT_EQ(p[0], 0.5f);  // half a pixel: centres against edges
@@ -472,3 +474,4 @@ TEST(OutlinePolygon, GoesAroundTheBuffer) {
 }
 
 }  // namespace
+}  // namespace marrow::render

@@ -1,7 +1,8 @@
-#include "stabilizer/render/renderer.h"
+#include "stabilizer/render/render_geometry.h"
 
 #include <gtest/gtest.h>
 
+namespace marrow::render {
 namespace {
 
 Renderer full_hd(float scale = 1) {
@@ -57,3 +58,4 @@ TEST(FitZoom, HalfResolution) {
 }
 
 }  // namespace
+}  // namespace marrow::render

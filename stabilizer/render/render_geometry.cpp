@@ -1,4 +1,4 @@
-#include "stabilizer/render/renderer.h"
+#include "stabilizer/render/render_geometry.h"
 
 #include <algorithm>
 #include <cmath>
