@@ -10,10 +10,11 @@
 #include <opencv2/video/tracking.hpp>
 #include <vector>
 
+#include "analysis/effect/analysis_parameter_rules.h"
 #include "bench/side_by_side.h"
 #include "host/media/clip.h"
-#include "pipeline/stabilize.h"
 #include "synthetic/scene.h"
+#include "tests/support/parameter_values.h"
 #include "tracking/color_pyramid.h"
 #include "tracking/feature_selector.h"
 #include "tracking/feature_tracker.h"
@@ -29,7 +30,6 @@
 namespace {
 
 using namespace marrow::tracking;
-using kelp::effect::Controls;
 using side_by_side::Compare;
 
 constexpr std::size_t kFrames = 8;
@@ -95,23 +95,21 @@ const Frames& Input() {
   return frames;
 }
 
-kelp::effect::ClipGeometry Geometry() {
-  kelp::effect::ClipGeometry geometry;
-  geometry.width = static_cast<std::uint32_t>(Input().width);
-  geometry.height = static_cast<std::uint32_t>(Input().height);
-  return geometry;
+kelp::effect::ParameterValues ValuesOf(bool detailed) {
+  kelp::effect::ParameterValues values;
+  values[kelp::effect::kDetailedAnalysisIndex] = detailed;
+  return values;
 }
 
 SelectorParams SelectorOf(bool detailed) {
-  Controls controls;
-  controls.detailed_analysis = detailed;
-  return MakeSelectorParams(controls, Geometry());
+  return kelp::analysis::effect::GetSelectorParams(ValuesOf(detailed),
+                                                   static_cast<std::uint32_t>(Input().width),
+                                                   static_cast<std::uint32_t>(Input().height));
 }
 
 TrackerParams TrackerOf(bool detailed) {
-  Controls controls;
-  controls.detailed_analysis = detailed;
-  return MakeTrackerParams(controls, Geometry());
+  return kelp::analysis::effect::GetTrackerParams(ValuesOf(detailed),
+                                                  static_cast<std::uint32_t>(Input().height));
 }
 
 std::size_t FrameOfRun(std::size_t t) {

@@ -3,13 +3,12 @@
 #include <algorithm>
 #include <cmath>
 
-#include "analysis/effect/analysis_parameter_rules.h"
+#include "stabilizer/effect/src/parameter_table.h"
+#include "stabilizer/render/frame_renderer.h"
 
 namespace kelp::effect {
 
 using marrow::stabilization::SolverParamsRecord;
-using marrow::tracking::SelectorParams;
-using marrow::tracking::TrackerParams;
 
 std::uint32_t ClipGeometry::square_width() const {
   const double square =
@@ -94,38 +93,6 @@ SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeom
                                          clip.frame_rate);
   }
   return record;
-}
-
-ParameterValues ValuesOf(const Controls& controls) {
-  ParameterValues values;
-  values[kResultIndex] = static_cast<int>(controls.result);
-  values[kSmoothnessIndex] = controls.smoothness;
-  values[kMethodIndex] = static_cast<int>(controls.method);
-  values[kFramingIndex] = static_cast<int>(controls.framing);
-  values[kMaximumScaleIndex] = controls.maximum_scale;
-  values[kActionSafeMarginIndex] = controls.action_safe_margin;
-  values[kAdditionalScaleIndex] = controls.additional_scale;
-  values[kDetailedAnalysisIndex] = controls.detailed_analysis;
-  values[kRollingShutterRippleIndex] = static_cast<int>(controls.rolling_shutter_ripple);
-  values[kCropLessSmoothMoreIndex] = controls.crop_less_smooth_more;
-  values[kSynthesisInputRangeIndex] = controls.synthesis_input_range;
-  values[kSynthesisEdgeFeatherIndex] = controls.synthesis_edge_feather;
-  return values;
-}
-
-SelectorParams MakeSelectorParams(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  return analysis::effect::GetSelectorParams(TableReader(values, false), clip.width, clip.height);
-}
-
-TrackerParams MakeTrackerParams(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  return analysis::effect::GetTrackerParams(TableReader(values, false), clip.height);
-}
-
-SolverParamsRecord MakeSolverParams(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  return GetSolverParams(TableReader(values, false), clip);
 }
 
 }  // namespace kelp::effect

@@ -3,7 +3,6 @@
 #include <cstdint>
 
 #include "effect/parameter_reader.h"
-#include "stabilizer/effect/src/parameter_rules.h"
 #include "stabilizer/render/frame_renderer.h"
 
 // How parameters become the settings of a render.
@@ -14,9 +13,5 @@ RenderSettings GetRenderSettings(const ParameterReader& params);
 
 // Synthesis Input Range in frames, halves away from zero; 0 unless the edges are synthesized.
 std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate);
-
-// The same of the controls, with the range; and the range alone.
-RenderSettings MakeRenderSettings(const Controls& controls, const ClipGeometry& clip);
-std::uint32_t MakeMargin(const Controls& controls, const ClipGeometry& clip);
 
 }  // namespace kelp::effect
