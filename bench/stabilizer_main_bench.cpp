@@ -36,10 +36,7 @@ using clock_type = std::chrono::steady_clock;
 constexpr std::uint32_t kWidth = 1920, kHeight = 1080;
 
 SolverParamsRecord Params() {
-  kelp::effect::ClipGeometry clip;
-  clip.width = kWidth;
-  clip.height = kHeight;
-  return kelp::effect::GetSolverParams(kelp::effect::ParameterValues(), clip);
+  return kelp::effect::GetSolverParams(kelp::effect::ParameterValues(), {kWidth, kHeight}, 25);
 }
 
 // The tracks alone; what the world knows besides is dropped, so that it does not count as memory.

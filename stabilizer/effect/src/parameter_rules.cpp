@@ -1,7 +1,6 @@
 #include "stabilizer/effect/src/parameter_rules.h"
 
 #include <algorithm>
-#include <cmath>
 
 #include "stabilizer/effect/src/parameter_table.h"
 #include "stabilizer/render/frame_renderer.h"
@@ -10,27 +9,15 @@ namespace kelp::effect {
 
 using marrow::stabilization::SolverParamsRecord;
 
-std::uint32_t ClipGeometry::square_width() const {
-  const double square =
-      std::floor(static_cast<double>(width) * static_cast<double>(pixel_aspect_num) /
-                     static_cast<double>(pixel_aspect_den) +
-                 0.5);
-  if (!(square >= 1.0)) return 1;  // also a ratio of 0 : 0
-  return static_cast<std::uint32_t>(std::min(square, 4294967295.0));
-}
-
-float ClipGeometry::pixel_aspect() const {
-  return static_cast<float>(static_cast<double>(square_width()) / static_cast<double>(width));
-}
-
-SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeometry& clip) {
+SolverParamsRecord GetSolverParams(const ParameterReader& params, const SourceShape& source,
+                                   double frame_rate) {
   const auto real = [&params](std::int32_t index) {
     return static_cast<float>(params.GetFloatParam(index));
   };
   const bool enhanced = params.GetPopupParam(kRollingShutterRippleIndex) ==
                         static_cast<int>(RollingShutterRipple::enhanced_reduction);
   const auto framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
-  const double larger_side = std::max(clip.square_width(), clip.height);
+  const double larger_side = std::max(source.square_width(), source.square_height());
   SolverParamsRecord record;
 
   record.rank = params.GetIntParam(kRankIndex);
@@ -68,7 +55,7 @@ SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeom
   if (record.homography_limit == 0) record.homography_limit = enhanced ? 100.0f : 50.0f;
   record.method_level = static_cast<float>(params.GetPopupParam(kMethodIndex) -
                                            (1.0 - params.GetFloatParam(kWarpFactorIndex) / 10.0));
-  record.pixel_aspect = clip.pixel_aspect();
+  record.pixel_aspect = source.pixel_aspect();
 
   record.crop = crops(framing);
   record.action_safe_margin =
@@ -90,7 +77,7 @@ SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeom
     record.path_gaussian_sigma =
         more == 1.0 ? 1000000.0f
                     : static_cast<float>(((std::clamp(more, 0.5, 1.0) - 0.5) * 2.0 * 18.0 + 2.0) *
-                                         clip.frame_rate);
+                                         frame_rate);
   }
   return record;
 }

@@ -14,11 +14,9 @@ namespace {
 
 using namespace analysis::effect;
 
-ClipGeometry Clip(std::uint32_t width, std::uint32_t height) {
-  ClipGeometry clip;
-  clip.width = width;
-  clip.height = height;
-  return clip;
+// Of a clip of 1920 x 1080 at 25 frames a second.
+marrow::stabilization::SolverParamsRecord SolverParamsOf(const ParameterValues& values) {
+  return GetSolverParams(values, {1920, 1080}, 25);
 }
 
 ParameterValues With(std::int32_t index, double value) {
@@ -80,8 +78,7 @@ TEST(ParameterRulesTest, CropLessSmoothMoreSetsThePathSigmas) {
   } cases[] = {{0, 1, 50},      {25, 480, 50},   {50, 1920, 50},
                {75, 1920, 275}, {99, 1920, 491}, {100, 1920, 1000000}};
   for (const auto& c : cases) {
-    const auto params =
-        GetSolverParams(With(kCropLessSmoothMoreIndex, c.percent), Clip(1920, 1080));
+    const auto params = SolverParamsOf(With(kCropLessSmoothMoreIndex, c.percent));
     EXPECT_NEAR(params.path_bilateral_sigma, c.bilateral, 1e-3) << c.percent;
     EXPECT_NEAR(params.path_gaussian_sigma, c.gaussian, 1e-3) << c.percent;
   }
@@ -89,7 +86,7 @@ TEST(ParameterRulesTest, CropLessSmoothMoreSetsThePathSigmas) {
 
 TEST(ParameterRulesTest, EnhancedRippleReductionAndFramingSetTheirLimits) {
   ParameterValues values;
-  auto params = GetSolverParams(values, Clip(1920, 1080));
+  auto params = SolverParamsOf(values);
   EXPECT_EQ(params.conservative_threshold, 7.5);
   EXPECT_EQ(params.homography_limit, 50.0f);
   EXPECT_EQ(params.maximum_scale, 1.5f);
@@ -99,7 +96,7 @@ TEST(ParameterRulesTest, EnhancedRippleReductionAndFramingSetTheirLimits) {
   values[kRollingShutterRippleIndex] = 2;
   values[kFramingIndex] = 1;  // stabilize only
   values[kSmoothnessIndex] = 10;
-  params = GetSolverParams(values, Clip(1920, 1080));
+  params = SolverParamsOf(values);
   EXPECT_EQ(params.conservative_threshold, 2.5);
   EXPECT_EQ(params.homography_limit, 100.0f);
   EXPECT_EQ(params.maximum_scale, 1.0f);
@@ -109,28 +106,9 @@ TEST(ParameterRulesTest, EnhancedRippleReductionAndFramingSetTheirLimits) {
 }
 
 TEST(ParameterRulesTest, AnamorphicClipsAreSolvedInSquarePixels) {
-  ClipGeometry clip = Clip(720, 576);
-  clip.pixel_aspect_num = 64;
-  clip.pixel_aspect_den = 45;
-  EXPECT_EQ(clip.square_width(), 1024u);
-  EXPECT_EQ(clip.pixel_aspect(), 1024.0f / 720.0f);
-  EXPECT_NEAR(GetSolverParams(ParameterValues(), clip).reconstruction_error_threshold,
-              0.0045 * 1024, 1e-9);
-  clip.pixel_aspect_num = 1;
-  clip.pixel_aspect_den = 10000;
-  EXPECT_EQ(clip.square_width(), 1u);
-  const struct {
-    std::uint32_t width;
-    std::int64_t num, den;
-    std::uint32_t square;
-  } cases[] = {{1440, 4, 3, 1920}, {720, 16, 15, 768}, {720, 10, 11, 655},
-               {720, 0, 1, 1},     {720, 0, 0, 1},     {720, 1, 0, UINT32_MAX}};
-  for (const auto& c : cases) {
-    clip.width = c.width;
-    clip.pixel_aspect_num = c.num;
-    clip.pixel_aspect_den = c.den;
-    EXPECT_EQ(clip.square_width(), c.square) << c.num << ':' << c.den;
-  }
+  const auto params = GetSolverParams(ParameterValues(), {720, 576, 64, 45}, 25);
+  EXPECT_EQ(params.pixel_aspect, 1024.0f / 720.0f);
+  EXPECT_NEAR(params.reconstruction_error_threshold, 0.0045 * 1024, 1e-9);
 }
 
 // Every parameter of the trackers gets a number of its own, so that a field that reads another's

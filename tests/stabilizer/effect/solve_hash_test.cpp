@@ -13,16 +13,8 @@ namespace {
 
 using marrow::stabilization::SolverParamsRecord;
 
-ClipGeometry FullHD() {
-  ClipGeometry clip;
-  clip.width = 1920;
-  clip.height = 1080;
-  clip.frame_rate = 25;
-  return clip;
-}
-
 SolverParamsRecord RecordOf(const ParameterValues& values) {
-  return GetSolverParams(values, FullHD());
+  return GetSolverParams(values, {1920, 1080}, 25);
 }
 
 // Numbers found by packing the fields with a script.

@@ -24,10 +24,7 @@ constexpr std::uint32_t kWidth = 640;
 constexpr std::uint32_t kHeight = 360;
 
 SolverParamsRecord Params() {
-  kelp::effect::ClipGeometry clip;
-  clip.width = kWidth;
-  clip.height = kHeight;
-  return GetSolverParams(kelp::effect::ParameterValues(), clip);
+  return GetSolverParams(kelp::effect::ParameterValues(), {kWidth, kHeight}, 25);
 }
 
 std::unique_ptr<Solver> NewSolver(const AllFeatures& table, bool needs_cropper = true,

@@ -35,11 +35,14 @@ boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height)
 struct ZoomCase {
   ZoomCase(std::int32_t width, std::int32_t height, Framing framing) {
     values[kFramingIndex] = static_cast<int>(framing);
-    state.warper = StandingWarper(1920, 1080);
-    state.crop = Window(width, height);
+    analysis::Replace(state.solve_result, [&](SolveResult& next) {
+      next.warper = StandingWarper(1920, 1080);
+      next.crop = Window(width, height);
+    });
   }
   double Zoom(bool auto_scale, bool additional, float scale = 1) {
-    renderer = Renderer(state.warper->unionBounds(), 1920, 1080, 64, 36, scale, scale);
+    renderer =
+        Renderer(state.solve_result->warper->unionBounds(), 1920, 1080, 64, 36, scale, scale);
     return state.GetZoom(values, renderer, auto_scale, additional);
   }
   bool OverCropped() { return state.IsOverCropped(values); }
@@ -52,7 +55,8 @@ struct ZoomCase {
 
   ParameterValues values;
   StabilizerState state{HX_InData{}, false};
-  Renderer renderer{{0, 0, 1, 1}, 1, 1, 2, 2, 1, 1};
+  const marrow::stabilization::frame_bounds bounds{0, 0, 1, 1};
+  Renderer renderer{bounds, 1, 1, 2, 2, 1, 1};
 };
 
 TEST(StabilizerStateTest, ZoomAndOutputRectangle) {
@@ -110,6 +114,136 @@ TEST(StabilizerStateTest, MarginInFramesRoundsHalvesUp) {
   EXPECT_EQ(MarginInFrames(values, 1e9), 2147483647u);
   values[kFramingIndex] = static_cast<int>(Framing::crop);
   EXPECT_EQ(MarginInFrames(values, 30), 0u);
+}
+
+// -- What a state shares with renders, and what a project keeps of it --
+
+using tessel::utility::Guid;
+
+bool operator==(const SourceShape& a, const SourceShape& b) {
+  return a.SameSize(b) && a.par_num == b.par_num && a.par_den == b.par_den;
+}
+
+// Makes it a solved state in which nothing is what a fresh state has.
+void Fill(StabilizerState& state, std::int32_t first_frame) {
+  state.source = {1440, 1080, 4, 3};
+  analysis::Replace(state.result, [&](analysis::AnalysisResult& next) {
+    next.job_input.FieldType = 2;
+    next.source_identity = Guid::MakeUnique();
+    next.tracker_identity = Guid::MakeUnique();
+    next.all_features = {};
+    next.all_features.feature_count = 1;
+    next.all_features.frame_count = 1;
+    next.all_features.first_frame = first_frame;
+    next.all_features.features->resize(1);
+  });
+  state.solve_result =
+      boost::make_shared<SolveResult>(SolveResult{StandingWarper(64, 36), Window(9, 9), 77, 78});
+  state.phase = SolvePhase::Solved;
+  analysis::AnalyzerRecord job;
+  job.tracker_guid = Guid::MakeUnique();
+  state.analyzer = boost::make_shared<analysis::AnalyzerPrem>(job, Guid(), analysis::JobFactory());
+  state.detailed = true;
+  state.progress.start_tick = 1234;
+}
+
+TEST(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
+  StabilizerSharedData block;
+  StabilizerState own({}, false), render({}, true);
+  Fill(own, 7);
+  own.shared = render.shared = &block;
+  render.TakeOver();
+  EXPECT_FALSE(render.has_frames()) << "nothing is published";
+  for (bool StabilizerState::*const flag :
+       {&StabilizerState::needs_solve, &StabilizerState::subsequent_solve,
+        static_cast<bool StabilizerState::*>(&StabilizerState::first_analysis)}) {
+    own.*flag = true;
+    own.Publish(false);
+    render.TakeOver();
+    EXPECT_TRUE(render.source == own.source);
+    EXPECT_EQ(render.result, own.result);
+    EXPECT_EQ(render.solve_result, own.solve_result);
+    EXPECT_EQ(render.analyzer, own.analyzer);
+    EXPECT_EQ(render.phase, SolvePhase::Solved);
+    EXPECT_EQ(render.needs_solve, own.needs_solve);
+    EXPECT_EQ(render.subsequent_solve, own.subsequent_solve);
+    EXPECT_EQ(render.first_analysis, own.first_analysis);
+    EXPECT_FALSE(block.contents.gpu_allowed);
+    own.*flag = false;
+  }
+  own.Publish(true);
+  EXPECT_TRUE(block.contents.gpu_allowed);
+}
+
+TEST(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
+  StabilizerSharedData block;
+  StabilizerState own({}, false), other({}, false);
+  Fill(own, 7);
+  Fill(other, 8);
+  own.shared = other.shared = &block;
+  other.Publish(false);
+  const auto analyzer = own.analyzer;
+  const auto cells = own.table().features;
+  own.TakeOver();
+  EXPECT_EQ(own.analyzer, analyzer);
+  EXPECT_EQ(own.table().features, cells);
+  EXPECT_EQ(own.table().first_frame, 7);
+  EXPECT_EQ(own.result->source_identity, other.result->source_identity);
+  EXPECT_EQ(own.result->tracker_identity, other.result->tracker_identity);
+  EXPECT_EQ(own.solve_result, other.solve_result);
+  EXPECT_EQ(other.table().first_frame, 8) << "what is published is never written";
+}
+
+TEST(StabilizerStateTest, WhatIsSavedIsLoaded) {
+  StabilizerState own({}, false);
+  Fill(own, 7);
+  for (const bool needs_solve : {true, false}) {
+    own.needs_solve = needs_solve;
+    SavedState saved = own.Save();
+    EXPECT_FALSE(saved.analysis_pending);
+    saved.analysis_pending = true;
+    StabilizerState loaded({}, false);
+    loaded.Load(saved, {});
+    EXPECT_TRUE(loaded.source == own.source);
+    EXPECT_EQ(loaded.result, own.result);
+    EXPECT_EQ(loaded.solve_result, own.solve_result);
+    EXPECT_EQ(loaded.phase, SolvePhase::Solved);
+    EXPECT_EQ(loaded.needs_solve, needs_solve);
+    EXPECT_EQ(loaded.progress.start_tick, 1234u);
+    EXPECT_TRUE(bool(loaded.detailed));
+    ASSERT_TRUE(loaded.analyzer);
+    EXPECT_EQ(loaded.analyzer->record().tracker_guid, own.analyzer->record().tracker_guid);
+    EXPECT_EQ(loaded.analyzer->GetSourceIdentity(), own.result->source_identity);
+    EXPECT_TRUE(loaded.analysis_pending);
+    EXPECT_FALSE(loaded.result_identity.IsNil());
+    EXPECT_EQ(loaded.solve_input_identity, loaded.result_identity);
+  }
+  own.analyzer.reset();
+  SavedState saved = own.Save();
+  saved.analysis_pending = true;
+  StabilizerState loaded({}, false);
+  loaded.Load(saved, {});
+  EXPECT_FALSE(loaded.analyzer);
+  EXPECT_FALSE(loaded.analysis_pending) << "frames would wait for nothing";
+}
+
+// What does not fit is left out, or told to be of no parameters.
+TEST(StabilizerStateTest, ResultsAreSavedAsFarAsTheyStand) {
+  StabilizerState own({}, false);
+  Fill(own, 7);
+  own.phase = SolvePhase::AnalysisFailed;
+  auto saved = own.Save().solve_result;
+  EXPECT_FALSE(saved->warper);
+  EXPECT_FALSE(saved->crop);
+  EXPECT_EQ(saved->solve_hash, 77);
+  EXPECT_EQ(saved->crop_hash, 78);
+  own.phase = SolvePhase::Solved;
+  own.deletion_identity = Guid::MakeUnique();  // of others than the table is marked with
+  saved = own.Save().solve_result;
+  EXPECT_EQ(saved->warper, own.solve_result->warper);
+  EXPECT_EQ(saved->solve_hash, std::int64_t{1} << 32);
+  EXPECT_EQ(saved->crop_hash, 78);
+  EXPECT_EQ(own.solve_result->solve_hash, 77);
 }
 
 }  // namespace
