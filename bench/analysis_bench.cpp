@@ -10,11 +10,11 @@
 #include <opencv2/video/tracking.hpp>
 #include <vector>
 
-#include "analysis/effect/analysis_parameter_rows.h"
 #include "analysis/effect/analysis_parameter_rules.h"
 #include "bench/side_by_side.h"
 #include "host/media/clip.h"
 #include "synthetic/scene.h"
+#include "tests/support/parameter_values.h"
 #include "tracking/color_pyramid.h"
 #include "tracking/feature_selector.h"
 #include "tracking/feature_tracker.h"
@@ -95,32 +95,20 @@ const Frames& Input() {
   return frames;
 }
 
-// The parameters as they stand when the effect is applied, but for Detailed Analysis.
-class Defaults final : public kelp::effect::VisibleParameterReader {
- public:
-  explicit Defaults(bool detailed) : detailed_(detailed) {}
-
- private:
-  std::int32_t IndexOf(std::int32_t id) const override { return id; }
-  bool IsAbsent(std::int32_t id) const override {
-    return id != kelp::analysis::effect::kDetailedAnalysisParam;
-  }
-  double Default(std::int32_t id) const override {
-    return kelp::analysis::effect::AnalysisParameterRow(id)->default_value;
-  }
-  double Value(std::int32_t) const override { return detailed_; }
-
-  const bool detailed_;
-};
+kelp::effect::ParameterValues ValuesOf(bool detailed) {
+  kelp::effect::ParameterValues values;
+  values[kelp::effect::kDetailedAnalysisIndex] = detailed;
+  return values;
+}
 
 SelectorParams SelectorOf(bool detailed) {
-  return kelp::analysis::effect::GetSelectorParams(Defaults(detailed),
+  return kelp::analysis::effect::GetSelectorParams(ValuesOf(detailed),
                                                    static_cast<std::uint32_t>(Input().width),
                                                    static_cast<std::uint32_t>(Input().height));
 }
 
 TrackerParams TrackerOf(bool detailed) {
-  return kelp::analysis::effect::GetTrackerParams(Defaults(detailed),
+  return kelp::analysis::effect::GetTrackerParams(ValuesOf(detailed),
                                                   static_cast<std::uint32_t>(Input().height));
 }
 

@@ -21,6 +21,7 @@
 #include "stabilizer/effect/src/parameter_rules.h"
 #include "stabilizer/effect/src/solver.h"
 #include "synthetic/track_world.h"
+#include "tests/support/parameter_values.h"
 
 // Cost of a solve by its stages, on tracks of a lively scene at 1080p with a mean life of 60
 // frames. Arguments: frames, slots. A stage's counter is its processor time in milliseconds; all of
@@ -35,10 +36,7 @@ using clock_type = std::chrono::steady_clock;
 constexpr std::uint32_t kWidth = 1920, kHeight = 1080;
 
 SolverParamsRecord Params() {
-  kelp::effect::ClipGeometry clip;
-  clip.width = kWidth;
-  clip.height = kHeight;
-  return kelp::effect::MakeSolverParams({}, clip);
+  return kelp::effect::GetSolverParams(kelp::effect::ParameterValues(), {kWidth, kHeight}, 25);
 }
 
 // The tracks alone; what the world knows besides is dropped, so that it does not count as memory.

@@ -19,21 +19,21 @@ std::int32_t Truncate(double value) {
 
 }  // namespace
 
-double VisibleParameterReader::GetFloatParam(std::int32_t id) const {
+double ParameterReader::GetFloatParam(std::int32_t id) const {
   const std::int32_t index = IndexOf(id);
   return IsAbsent(index) ? Default(index) : Value(index);
 }
 
-std::int32_t VisibleParameterReader::GetIntParam(std::int32_t id) const {
+std::int32_t ParameterReader::GetIntParam(std::int32_t id) const {
   const std::int32_t index = IndexOf(id);
   return Truncate(IsAbsent(index) ? Default(index) : Value(index) + 0.5);
 }
 
-bool VisibleParameterReader::GetBoolParam(std::int32_t id) const {
+bool ParameterReader::GetBoolParam(std::int32_t id) const {
   return GetFloatParam(id) != 0;
 }
 
-std::int32_t VisibleParameterReader::GetPopupParam(std::int32_t id) const {
+std::int32_t ParameterReader::GetPopupParam(std::int32_t id) const {
   return Truncate(GetFloatParam(id));
 }
 

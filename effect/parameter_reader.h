@@ -2,27 +2,19 @@
 
 #include <cstdint>
 
-// Reading parameters by id or index.
 namespace kelp::effect {
 
+// How an effect reads its parameters, by id or index: one that is not declared has its default, and
+// nobody is asked for it.
 class ParameterReader {
  public:
   virtual ~ParameterReader() = default;
-  virtual double GetFloatParam(std::int32_t id) const = 0;
-  virtual std::int32_t GetIntParam(std::int32_t id) const = 0;
-  virtual bool GetBoolParam(std::int32_t id) const = 0;
-  virtual std::int32_t GetPopupParam(std::int32_t id) const = 0;
-};
 
-// How an effect reads its parameters: one that is not declared has its default, and nobody is asked
-// for it.
-class VisibleParameterReader : public ParameterReader {
- public:
-  double GetFloatParam(std::int32_t id) const final;
+  double GetFloatParam(std::int32_t id) const;
   // The value + 0.5, truncated; a default is truncated as it is.
-  std::int32_t GetIntParam(std::int32_t id) const final;
-  bool GetBoolParam(std::int32_t id) const final;
-  std::int32_t GetPopupParam(std::int32_t id) const final;
+  std::int32_t GetIntParam(std::int32_t id) const;
+  bool GetBoolParam(std::int32_t id) const;
+  std::int32_t GetPopupParam(std::int32_t id) const;
 
  private:
   // An id that has no index is taken for one.

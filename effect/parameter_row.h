@@ -5,6 +5,7 @@
 #include <map>
 #include <string>
 
+#include "platform/hx/hx_controls.h"
 #include "platform/hx/hx_params.h"
 
 // A parameter as it is declared to the host, as data.
@@ -64,13 +65,29 @@ constexpr ParameterRow SliderRow(std::int32_t disk_id, ParameterText name, Param
   return {disk_id, HX_PARAM_FLOAT_SLIDER, name,   {},    valid,
           slider,  default_value,         format, flags, ui_flags};
 }
-constexpr ParameterRow PopupRow(std::int32_t disk_id, ParameterText name, ParameterText items,
-                                std::int32_t default_item, std::uint32_t flags) {
-  return {disk_id, HX_PARAM_POPUP, name, items, {}, {}, double(default_item), {}, flags};
+constexpr ParameterRow SliderRow(const HX_SliderControl& control, ParameterText name,
+                                 ParameterRange slider, ParameterFormat format,
+                                 std::uint32_t flags) {
+  return SliderRow(control.disk_id, name,
+                   {static_cast<float>(control.min), static_cast<float>(control.max)}, slider,
+                   control.default_value, format, flags);
 }
-constexpr ParameterRow CheckboxRow(std::int32_t disk_id, ParameterText name, bool on,
+constexpr ParameterRow PopupRow(const HX_PopupControl& control, ParameterText name,
+                                ParameterText items, std::uint32_t flags) {
+  return {.disk_id = control.disk_id,
+          .kind = HX_PARAM_POPUP,
+          .name = name,
+          .text = items,
+          .default_value = double(control.default_item),
+          .flags = flags};
+}
+constexpr ParameterRow CheckboxRow(const HX_CheckboxControl& control, ParameterText name,
                                    std::uint32_t flags) {
-  return {disk_id, HX_PARAM_CHECKBOX, name, {}, {}, {}, on ? 1.0 : 0.0, {}, flags};
+  return {.disk_id = control.disk_id,
+          .kind = HX_PARAM_CHECKBOX,
+          .name = name,
+          .default_value = double(control.default_value),
+          .flags = flags};
 }
 constexpr ParameterRow ButtonRow(std::int32_t disk_id, ParameterText label, std::uint32_t flags,
                                  std::uint32_t ui_flags = 0) {

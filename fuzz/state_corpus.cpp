@@ -5,7 +5,7 @@
 #include <iostream>
 
 #include "fuzz/state_input.h"
-#include "tests/stabilizer/effect/state_format/sample_payload.h"
+#include "tests/stabilizer/effect/state_format/samples.h"
 
 int main(int argc, char** argv) {
   using namespace kelp::effect;
@@ -20,17 +20,10 @@ int main(int argc, char** argv) {
     std::ofstream(std::filesystem::path(argv[1]) / name, std::ios::binary)
         << StateInput(version, flags, payload);
   };
-  for (std::uint32_t version = 3; version <= 16; ++version) {
-    for (const int phase : {0, 2, 4, 5}) {
-      for (const bool full : {false, true}) {
-        Sample sample;
-        sample.version = version;
-        sample.phase = phase;
-        sample.has_job = full;
-        sample.has_crop = full;
-        add(version, full ? 0 : kOneByOne, SamplePayload(sample));
-        if (full) add(version, kAsItStands, Deflated(SamplePayload(sample)));
-      }
-    }
+  for (const auto& file : std::filesystem::directory_iterator(CALMFRAME_SAMPLES)) {
+    const Sample sample = ReadSample(file.path().filename());
+    add(sample.version, kAsItStands, sample.deflated);
+    add(sample.version, 0, sample.plain);
+    add(sample.version, kOneByOne, sample.plain);
   }
 }

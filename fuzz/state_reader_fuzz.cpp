@@ -11,7 +11,7 @@
 #include "stabilizer/effect/src/state_format/format.h"
 #include "stabilizer/effect/src/state_format/state_reader.h"
 #include "stabilizer/effect/src/state_format/state_writer.h"
-#include "tests/stabilizer/effect/state_format/sample_payload.h"
+#include "tests/stabilizer/effect/state_format/samples.h"
 
 namespace {
 
@@ -29,7 +29,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   if (size < 2) return 0;
   const std::uint32_t version = kFirstVersion + data[0] % kVersionCount;
   const std::uint8_t flags = data[1];
-  PresentSource present{64, 36, 1, 1};
+  SourceShape present{64, 36, 1, 1};
   if (flags & kOneByOne) present.width = present.height = 1;
   if (flags & kAnamorphic) present.par_num = 2;
   std::string payload(reinterpret_cast<const char*>(data + 2), size - 2);

@@ -132,9 +132,9 @@ bool AnalysisEffect::NeedsOverlayOrBanner() {
 bool AnalysisEffect::IsRenderableFrame() {
   const CurrentFrame current = GetCurrentFrame(true);
   if (!current.valid) return false;
-  const AnalysisState& state = *GetState();
-  const std::int64_t row = current.frame - state.first_frame;
-  if (row < 0 || row >= state.all_features.frame_count) return false;
+  const marrow::tracking::AllFeatures& table = GetState()->table();
+  const std::int64_t row = current.frame - table.first_frame;
+  if (row < 0 || row >= table.frame_count) return false;
   return !ShowsOverlay() && IsFinishedStatus(GetStatusForFrame(current.frame));
 }
 
@@ -251,7 +251,7 @@ bool AnalysisEffect::DetachSharedData() {
 
 CurrentFrame AnalysisEffect::GetCurrentFrame(bool clamped) try {
   const AnalysisState* const state = GetState();
-  if (state == nullptr || state->all_features.frame_count <= 0) return {};
+  if (state == nullptr || state->table().frame_count <= 0) return {};
   const HX_InData& in = *context().in;
   std::int32_t start = 0;
   {
@@ -261,10 +261,10 @@ CurrentFrame AnalysisEffect::GetCurrentFrame(bool clamped) try {
   std::int32_t time = in.current_time;
   if (clamped) time = std::max(std::min(time, in.total_time), 0);
   const std::int64_t start_row =
-      std::int64_t{std::max(start, 0)} * (CountsFields(state->job_input) ? 2 : 1);
+      std::int64_t{std::max(start, 0)} * (CountsFields(state->result->job_input) ? 2 : 1);
   const std::int64_t frame =
-      FloorSteps({time, in.time_scale}, RowDuration(state->job_input)) + start_row;
-  const std::int64_t last = state->all_features.frame_count + start_row - 1;
+      FloorSteps({time, in.time_scale}, RowDuration(state->result->job_input)) + start_row;
+  const std::int64_t last = state->table().frame_count + start_row - 1;
   return {true, std::clamp<std::int64_t>(frame, 0, last)};
 } catch (...) {
   kelp::effect::ClearMessage(context());
@@ -281,7 +281,7 @@ StatusRecord AnalysisEffect::GetStatusRecord() {
 }
 
 bool AnalysisEffect::IsOneByOne() const {
-  return context().in->width == 1 && context().in->height == 1;
+  return kelp::effect::ShapeOf(*context().in).one_by_one();
 }
 
 }  // namespace kelp::analysis::effect

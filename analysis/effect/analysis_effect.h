@@ -50,7 +50,7 @@ class AnalysisEffect : public kelp::effect::GenericEffect {
   // 0 for an id that is none of AnalysisParam.
   virtual double GetParamDefault(std::int32_t id);
 
-  // The value at the call's time, as VisibleParameterReader reads it.
+  // The value at the call's time, as ParameterReader reads it.
   virtual double GetFloatParam(std::int32_t id);
   virtual std::int32_t GetIntParam(std::int32_t id);
   virtual bool GetBoolParam(std::int32_t id);

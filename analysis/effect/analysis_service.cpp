@@ -204,6 +204,12 @@ void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
   AnalysisState* present = nullptr;
   try {
     present = GetState();
+    if (present != nullptr) {
+      Replace(present->result, [&](AnalysisResult& next) {
+        next.tracker_identity = analyzer->GetTrackerGuid();
+        next.source_identity = analyzer->GetSourceIdentity();
+      });
+    }
   } catch (...) {  // nobody would end the job
     EndJob(context(), *analyzer);
     throw;
@@ -214,8 +220,6 @@ void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
   }
   present->first_analysis = true;
   present->progress = ProgressClock{HighPrecisionTime::Now(), 0, 0};
-  present->tracker_identity = analyzer->GetTrackerGuid();
-  present->source_identity = analyzer->GetSourceIdentity();
   present->analyzer = analyzer;
   present->detailed = detailed;
   PublishStatus(FrameStatus::AnalysisInProgress);
@@ -266,7 +270,7 @@ void AnalysisEffect::RefreshParams() {
 
 void AnalysisEffect::SaveTrackFile() {
   const AnalysisState* const state = GetState();
-  if (state != nullptr && state->all_features.frame_count > 0) PickFileAndSaveTracks(state);
+  if (state != nullptr && state->table().frame_count > 0) PickFileAndSaveTracks(state);
   UpdateButton(kSaveTrackFileParam, true, "");
 }
 

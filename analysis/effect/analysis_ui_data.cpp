@@ -81,13 +81,13 @@ AnalysisUIData::AnalysisUIData(AnalysisEffect& effect)
   const CurrentFrame current = effect.GetCurrentFrame(true);
   if (current.valid) {
     const AnalysisState& state = *effect.GetState();
-    const marrow::tracking::AllFeatures& table = state.all_features;
-    const std::int64_t row = current.frame - state.first_frame;
+    const marrow::tracking::AllFeatures& table = state.table();
+    const std::int64_t row = current.frame - table.first_frame;
     const HX_InData& in = *context_.in;
     width_ = in.width;
     height_ = in.height;
     pixel_aspect_ = ValueOf(in.pixel_aspect);
-    analysis_ = state.source_identity;
+    analysis_ = state.result->source_identity;
     if (row >= 0 && row < table.frame_count) {
       frame_ = static_cast<std::int32_t>(row);
       selected_frame_.cells = {table.features, table.features->data() + row * table.feature_count};

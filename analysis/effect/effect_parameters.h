@@ -10,7 +10,7 @@ namespace kelp::analysis::effect {
 inline constexpr std::int32_t kNoIndex = -1;
 
 // The parameters of an effect's host at the time of its call, for the rules that read them.
-class EffectParameters final : public kelp::effect::VisibleParameterReader {
+class EffectParameters final : public kelp::effect::ParameterReader {
  public:
   explicit EffectParameters(AnalysisEffect& effect) : effect_(effect) {}
 

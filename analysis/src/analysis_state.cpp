@@ -33,10 +33,12 @@ bool AnalysisState::TakeResults() {
   const boost::shared_ptr<marrow::tracking::AllFeatures> features =
       analyzer ? analyzer->GetFeatures() : boost::shared_ptr<marrow::tracking::AllFeatures>();
   if (!features) return false;
-  all_features = *features;
-  first_frame = static_cast<std::int32_t>(analyzer->FirstRunFrame());
-  job_input = analyzer->record().job_input_parameters;
-  tracker_identity = analyzer->GetTrackerGuid();
+  Replace(result, [&](AnalysisResult& next) {
+    next.all_features = *features;
+    next.all_features.first_frame = static_cast<std::int32_t>(analyzer->FirstRunFrame());
+    next.job_input = analyzer->record().job_input_parameters;
+    next.tracker_identity = analyzer->GetTrackerGuid();
+  });
   MakeResultIdentityUnique();
   return true;
 }

@@ -5,14 +5,15 @@
 #include <cstdint>
 #include <string>
 
+#include "analysis/src/analysis_result.h"
 #include "analysis/src/analyzer.h"
 #include "analysis/src/progress.h"
+#include "effect/source_shape.h"
 
 namespace kelp::analysis {
 
-// What an effect instance keeps of its analysis: the result with the identities of what it was made
-// from, and the analyzer while one is at work. The host's main thread only. The order of the
-// virtual operations is part of the interface.
+// What an effect instance keeps of its analysis: the result, and the analyzer while one is at work.
+// The host's main thread only. The order of the virtual operations is part of the interface.
 class AnalysisState {
  public:
   AnalysisState() = default;
@@ -37,14 +38,12 @@ class AnalysisState {
   // changes, if there are none.
   bool TakeResults();
 
-  JobInput job_input;                      // of the result
-  tessel::utility::Guid source_identity;   // GetUpstreamIdentifier; nil if not known
-  tessel::utility::Guid tracker_identity;  // GetIdentifierForTracker of the result
-  marrow::tracking::AllFeatures all_features;
-  std::int32_t first_frame = 0;  // absolute index of the table's row 0; fields count as frames
-  std::int32_t source_width = 0, source_height = 0;  // when the result was made
-  std::int32_t par_num = 1;
-  std::uint32_t par_den = 1;
+  const marrow::tracking::AllFeatures& table() const { return result->all_features; }
+
+  // Never null, and never written: renders hold it too. From the start of an analysis on the two
+  // identities are those of what it is made from, though the table is still the older one.
+  boost::shared_ptr<const AnalysisResult> result = boost::make_shared<AnalysisResult>();
+  kelp::effect::SourceShape source;  // when the result was made
   boost::shared_ptr<Analyzer> analyzer;
   ProgressClock progress;
   std::string error_text;

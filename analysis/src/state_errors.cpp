@@ -14,7 +14,7 @@ constexpr char kSizeMismatch[] =
     "$$$/Plugin/AnalysisState/Error/SizeMismatch=^1 for layer #{ldquo}^2#{rdquo} requires "
     "re-analysis because the source dimensions have changed from ^3 to ^4.";
 
-std::string SizeText(const SourceSize& size) {
+std::string SizeText(const kelp::effect::SourceShape& size) {
   using tessel::utility::NumberToString;
   return tessel::utility::ReplaceInString(tessel::config::Localizer::Localize(kDimensions),
                                           NumberToString(size.width), NumberToString(size.height));
@@ -48,7 +48,8 @@ void ReportStateError(HX_InData* host_in, HX_OutData* host_out, const char* lite
 }
 
 void ReportSizeMismatch(HX_InData* host_in, HX_OutData* host_out, const std::string& effect_name,
-                        const SourceSize& stored, const SourceSize& present, AfterReport after) {
+                        const kelp::effect::SourceShape& stored,
+                        const kelp::effect::SourceShape& present, AfterReport after) {
   const std::string layer = LayerName(host_in, host_out);
   ReportStateError(host_in, host_out, kSizeMismatch,
                    {effect_name, layer, SizeText(stored), SizeText(present)}, after);

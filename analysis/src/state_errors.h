@@ -5,6 +5,7 @@
 #include <stdexcept>
 #include <string>
 
+#include "effect/source_shape.h"
 #include "platform/hx/hx_effect.h"
 
 namespace kelp::analysis {
@@ -23,13 +24,9 @@ enum class AfterReport { GoOn, Throw };
 void ReportStateError(HX_InData* host_in, HX_OutData* host_out, const char* literal,
                       std::initializer_list<std::string> values, AfterReport after);
 
-struct SourceSize {
-  std::int32_t width = 0;
-  std::int32_t height = 0;
-};
-
 // The stored state is of a source of another size.
 void ReportSizeMismatch(HX_InData* host_in, HX_OutData* host_out, const std::string& effect_name,
-                        const SourceSize& stored, const SourceSize& present, AfterReport after);
+                        const kelp::effect::SourceShape& stored,
+                        const kelp::effect::SourceShape& present, AfterReport after);
 
 }  // namespace kelp::analysis

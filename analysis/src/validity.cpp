@@ -15,18 +15,19 @@ Guid IdentifierWithoutPath(JobInput input) {
 }
 
 bool FitsInputs(AnalysisState& state, const PresentInputs& present) {
-  if (state.all_features.frame_count <= 0) return false;
-  if (IdentifierWithoutPath(state.job_input) != IdentifierWithoutPath(present.job_input())) {
+  const boost::shared_ptr<const AnalysisResult> stored = state.result;
+  if (stored->all_features.frame_count <= 0) return false;
+  if (IdentifierWithoutPath(stored->job_input) != IdentifierWithoutPath(present.job_input())) {
     return false;
   }
-  if (!state.tracker_identity.IsNil() && present.tracker_identity() != state.tracker_identity) {
+  if (!stored->tracker_identity.IsNil() && present.tracker_identity() != stored->tracker_identity) {
     return false;
   }
-  if (state.source_identity.IsNil()) return false;
+  if (stored->source_identity.IsNil()) return false;
   const Guid first = present.source_identity();
-  if (first == state.source_identity) return true;
-  if (present.source_identity() != state.source_identity) return false;
-  state.source_identity = first;
+  if (first == stored->source_identity) return true;
+  if (present.source_identity() != stored->source_identity) return false;
+  Replace(state.result, [&first](AnalysisResult& next) { next.source_identity = first; });
   return true;
 }
 
@@ -50,12 +51,12 @@ FrameStatus GetAnalysisStatus(const AnalysisState& state, std::int64_t frame,
                               const JobInput* present) {
   if (present == nullptr) return FrameStatus::GeneralFailure;
   if (state.analyzer || state.analysis_pending) return FrameStatus::AnalysisInProgress;
-  if (state.all_features.frame_count == 0) return FrameStatus::PressAnalyze;
-  if (frame < state.first_frame ||
-      frame >= std::int64_t{state.first_frame} + state.all_features.frame_count) {
+  const marrow::tracking::AllFeatures& table = state.table();
+  if (table.frame_count == 0) return FrameStatus::PressAnalyze;
+  if (frame < table.first_frame || frame >= std::int64_t{table.first_frame} + table.frame_count) {
     return FrameStatus::OutsideRange;
   }
-  const JobInput& stored = state.job_input;
+  const JobInput& stored = state.result->job_input;
   if (stored.FieldType != -1 && SpanLiesWithin(*present, stored) &&
       IdenticalTimes(present->StepTime, stored.StepTime) &&
       present->FieldType == stored.FieldType) {

@@ -4,76 +4,131 @@
 #include <cctype>
 #include <cmath>
 #include <cstdlib>
-#include <iterator>
-#include <utility>
+#include <variant>
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
 #include "host/base/nearest_match.h"
+#include "platform/hx/hx_controls.h"
 #include "platform/tessel/debug.h"
 
 namespace calmframe {
 namespace {
 
-// Disk ids of the effect's parameters.
-enum : std::int32_t {
-  kActionSafeMargin = 3,
-  kMaximumScale = 4,
-  kAdditionalScale = 16,
-  kResult = 19,
-  kSmoothness = 20,
-  kFraming = 22,
-  kCropLessSmoothMore = 23,
-  kHideWarningBanner = 26,
-  kMethod = 28,
-  kSynthesisEdgeFeather = 35,
-  kDetailedAnalysis = 36,
-  kRollingShutterRipple = 37,
-  kSynthesisInputRange = 38
-};
-
 constexpr char kControls[] = "Controls";
 constexpr char kFinerControls[] = "Finer controls";
+
+struct Slider {
+  HX_SliderControl control;
+  const char* unit;
+};
 
 struct Choice {
   std::string name;
   double value;
   std::string meaning;  // goes on where the flag's description ends
 };
+struct Popup {
+  HX_PopupControl control;
+  std::vector<Choice> choices;
+};
 
-// A popup; the choice that holds without the flag first.
-CLI::Option* AddPopup(CLI::App& command, ControlFlags& flags, const std::string& flag,
-                      std::int32_t disk_id, const std::vector<Choice>& choices,
-                      const std::string& description) {
+struct Switch {
+  HX_CheckboxControl control;
+};
+
+struct Flag {
+  const char* name;
+  std::variant<Slider, Popup, Switch> kind;
+  const char* description;
+  const char* group = kFinerControls;
+};
+
+std::int32_t DiskIdOf(const Flag& flag) {
+  return std::visit([](const auto& kind) { return kind.control.disk_id; }, flag.kind);
+}
+
+// In the order of the help.
+const std::vector<Flag>& Flags() {
+  static const std::vector<Flag> flags = {
+      {"--smoothness", Slider{HX_SMOOTHNESS, "PERCENT"},
+       "How much of the camera's motion is smoothed away: more is calmer and crops more",
+       kControls},
+      {"--result",
+       Popup{HX_RESULT,
+             {{"smooth-motion", 1, "keeps them but calms them"},
+              {"no-motion", 2, "holds the picture still as on a tripod"}}},
+       "The camera's own moves", kControls},
+      {"--framing",
+       Popup{HX_FRAMING,
+             {{"crop-auto-scale", 3, "cuts them off and enlarges the rest to the full frame"},
+              {"crop", 2, "only cuts them off"},
+              {"stabilize-only", 1, "shows them"},
+              {"synthesize-edges", 4, "fills them from the frames before and after"}}},
+       "The edges that the motion lays bare", kControls},
+      {"--method",
+       Popup{HX_METHOD,
+             {{"subspace-warp", 4, "bends each part of it"},
+              {"perspective", 3, "tilts it"},
+              {"position-scale-rotation", 2, "turns and resizes it"},
+              {"position", 1, "only shifts it"}}},
+       "How far a frame is changed, less where the picture comes out bent", kControls},
+      {"--maximum-scale", Slider{HX_MAXIMUM_SCALE, "PERCENT"},
+       "The most that crop-auto-scale may enlarge; what that leaves empty stays black"},
+      {"--crop-less-smooth-more", Slider{HX_CROP_LESS_SMOOTH_MORE, "PERCENT"},
+       "How still the crop window stands: above 50 it follows less of the motion, which is "
+       "calmer and crops more; below 50 it gives way to sudden moves"},
+      {"--additional-scale", Slider{HX_ADDITIONAL_SCALE, "PERCENT"},
+       "A scale on top of the others"},
+      {"--action-safe-margin", Slider{HX_ACTION_SAFE_MARGIN, "PERCENT"},
+       "A border of the frame that crop-auto-scale need not fill"},
+      {"--detailed-analysis", Switch{HX_DETAILED_ANALYSIS},
+       "Track four times as many features in larger windows, for clips whose motion comes "
+       "out wrong; slower"},
+      {"--rolling-shutter-ripple",
+       Popup{HX_ROLLING_SHUTTER_RIPPLE,
+             {{"automatic", 1, "works where it is sure"},
+              {"enhanced", 2, "works harder, on less evidence"}}},
+       "What perspective and subspace-warp do against the wobble of a rolling shutter"},
+      {"--synthesis-input-range", Slider{HX_SYNTHESIS_INPUT_RANGE, "SECONDS"},
+       "How far away in time synthesize-edges looks for pixels; more fills more and is slower"},
+      {"--synthesis-edge-feather", Slider{HX_SYNTHESIS_EDGE_FEATHER, "PIXELS"},
+       "How softly synthesize-edges joins one frame to another"},
+      {"--hide-warning-banner", Switch{HX_HIDE_WARNING_BANNER},
+       "Draw no banner over frames that could not be steadied as asked"}};
+  return flags;
+}
+
+CLI::Option* Add(CLI::App& command, ControlFlags& flags, const Flag& flag, const Slider& slider) {
+  const HX_SliderControl& control = slider.control;
+  const auto take = [id = control.disk_id, &flags](double value) { flags.values[id] = value; };
+  return AddNumber<double>(command, flag.name, take, slider.unit, control.min, control.max,
+                           flag.description)
+      ->default_str(NumberText(control.default_value));
+}
+
+CLI::Option* Add(CLI::App& command, ControlFlags& flags, const Flag& flag, const Popup& popup) {
   std::vector<std::string> names;
-  std::string meanings;
-  for (const Choice& choice : choices) {
+  std::string meanings, default_name;
+  for (const Choice& choice : popup.choices) {
     meanings += (names.empty() ? ": " : "; ") + choice.name + " " + choice.meaning;
     names.push_back(choice.name);
+    if (choice.value == popup.control.default_item) default_name = choice.name;
   }
-  const auto take = [choices, disk_id, &flags](const std::string& text) {
-    for (const Choice& choice : choices) {
-      if (choice.name == text) flags.values[disk_id] = choice.value;
+  const auto take = [&popup, &flags](const std::string& text) {
+    for (const Choice& choice : popup.choices) {
+      if (choice.name == text) flags.values[popup.control.disk_id] = choice.value;
     }
   };
-  return AddChoice(command, flag, take, names, description + meanings)->default_str(names[0]);
+  return AddChoice(command, flag.name, take, names, flag.description + meanings)
+      ->default_str(default_name);
 }
 
-CLI::Option* AddSlider(CLI::App& command, ControlFlags& flags, const std::string& flag,
-                       std::int32_t disk_id, const std::string& unit, double least, double most,
-                       double default_value, const std::string& description) {
-  const auto take = [disk_id, &flags](double value) { flags.values[disk_id] = value; };
-  return AddNumber<double>(command, flag, take, unit, least, most, description)
-      ->default_str(NumberText(default_value));
-}
-
-void AddSwitch(CLI::App& command, ControlFlags& flags, const std::string& flag,
-               std::int32_t disk_id, const std::string& description) {
-  command
-      .add_flag_callback(
-          flag, [disk_id, &flags] { flags.values[disk_id] = 1; }, description)
-      ->group(kFinerControls);
+CLI::Option* Add(CLI::App& command, ControlFlags& flags, const Flag& flag, const Switch& checkbox) {
+  return command.add_flag_callback(
+      flag.name, [id = checkbox.control.disk_id, &flags] { flags.values[id] = 1; },
+      flag.description);
 }
 
 bool SameWord(const std::string& a, const std::string& b) {
@@ -130,58 +185,10 @@ double ParseValue(const HX_ParamDef& param, const std::string& text) {
 }  // namespace
 
 void AddControlFlags(CLI::App& command, ControlFlags& flags) {
-  AddSlider(command, flags, "--smoothness", kSmoothness, "PERCENT", 0, 1000, 50,
-            "How much of the camera's motion is smoothed away: more is calmer and crops more")
-      ->group(kControls);
-  AddPopup(command, flags, "--result", kResult,
-           {{"smooth-motion", 1, "keeps them but calms them"},
-            {"no-motion", 2, "holds the picture still as on a tripod"}},
-           "The camera's own moves")
-      ->group(kControls);
-  AddPopup(command, flags, "--framing", kFraming,
-           {{"crop-auto-scale", 3, "cuts them off and enlarges the rest to the full frame"},
-            {"crop", 2, "only cuts them off"},
-            {"stabilize-only", 1, "shows them"},
-            {"synthesize-edges", 4, "fills them from the frames before and after"}},
-           "The edges that the motion lays bare")
-      ->group(kControls);
-  AddPopup(command, flags, "--method", kMethod,
-           {{"subspace-warp", 4, "bends each part of it"},
-            {"perspective", 3, "tilts it"},
-            {"position-scale-rotation", 2, "turns and resizes it"},
-            {"position", 1, "only shifts it"}},
-           "How far a frame is changed, less where the picture comes out bent")
-      ->group(kControls);
-
-  AddSlider(command, flags, "--maximum-scale", kMaximumScale, "PERCENT", 100, 10000, 150,
-            "The most that crop-auto-scale may enlarge; what that leaves empty stays black")
-      ->group(kFinerControls);
-  AddSlider(command, flags, "--crop-less-smooth-more", kCropLessSmoothMore, "PERCENT", 0, 100, 50,
-            "How still the crop window stands: above 50 it follows less of the motion, which is "
-            "calmer and crops more; below 50 it gives way to sudden moves")
-      ->group(kFinerControls);
-  AddSlider(command, flags, "--additional-scale", kAdditionalScale, "PERCENT", 0, 10000, 100,
-            "A scale on top of the others")
-      ->group(kFinerControls);
-  AddSlider(command, flags, "--action-safe-margin", kActionSafeMargin, "PERCENT", 0, 100, 0,
-            "A border of the frame that crop-auto-scale need not fill")
-      ->group(kFinerControls);
-  AddSwitch(command, flags, "--detailed-analysis", kDetailedAnalysis,
-            "Track four times as many features in larger windows, for clips whose motion comes "
-            "out wrong; slower");
-  AddPopup(command, flags, "--rolling-shutter-ripple", kRollingShutterRipple,
-           {{"automatic", 1, "works where it is sure"},
-            {"enhanced", 2, "works harder, on less evidence"}},
-           "What perspective and subspace-warp do against the wobble of a rolling shutter")
-      ->group(kFinerControls);
-  AddSlider(command, flags, "--synthesis-input-range", kSynthesisInputRange, "SECONDS", 0, 999, 0.5,
-            "How far away in time synthesize-edges looks for pixels; more fills more and is slower")
-      ->group(kFinerControls);
-  AddSlider(command, flags, "--synthesis-edge-feather", kSynthesisEdgeFeather, "PIXELS", 0, 999, 10,
-            "How softly synthesize-edges joins one frame to another")
-      ->group(kFinerControls);
-  AddSwitch(command, flags, "--hide-warning-banner", kHideWarningBanner,
-            "Draw no banner over frames that could not be steadied as asked");
+  for (const Flag& flag : Flags()) {
+    std::visit([&](const auto& kind) { Add(command, flags, flag, kind)->group(flag.group); },
+               flag.kind);
+  }
   command.add_option("--param", flags.params, "Any parameter of `calmframe params`; repeatable")
       ->type_name("NAME=VALUE")
       ->allow_extra_args(false)
@@ -191,11 +198,8 @@ void AddControlFlags(CLI::App& command, ControlFlags& flags) {
 }
 
 bool HasFlag(std::int32_t disk_id) {
-  constexpr std::int32_t kFlagged[] = {
-      kActionSafeMargin, kMaximumScale,         kAdditionalScale,    kResult, kSmoothness,
-      kFraming,          kCropLessSmoothMore,   kHideWarningBanner,  kMethod, kSynthesisEdgeFeather,
-      kDetailedAnalysis, kRollingShutterRipple, kSynthesisInputRange};
-  return std::find(std::begin(kFlagged), std::end(kFlagged), disk_id) != std::end(kFlagged);
+  return std::any_of(Flags().begin(), Flags().end(),
+                     [disk_id](const Flag& flag) { return DiskIdOf(flag) == disk_id; });
 }
 
 void ShowExperimentalParameters(const ControlFlags& flags) {

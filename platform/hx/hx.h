@@ -3,6 +3,7 @@
 
 /* The whole interface between a host and an effect plug-in. */
 
+#include "platform/hx/hx_controls.h"
 #include "platform/hx/hx_effect.h"
 #include "platform/hx/hx_exports.h"
 #include "platform/hx/hx_params.h"

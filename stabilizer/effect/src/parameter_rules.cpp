@@ -1,37 +1,24 @@
 #include "stabilizer/effect/src/parameter_rules.h"
 
 #include <algorithm>
-#include <cmath>
 
-#include "analysis/effect/analysis_parameter_rules.h"
+#include "stabilizer/effect/src/parameter_table.h"
+#include "stabilizer/render/framing.h"
 
 namespace kelp::effect {
 
+using marrow::render::Framing;
 using marrow::stabilization::SolverParamsRecord;
-using marrow::tracking::SelectorParams;
-using marrow::tracking::TrackerParams;
 
-std::uint32_t ClipGeometry::square_width() const {
-  const double square =
-      std::floor(static_cast<double>(width) * static_cast<double>(pixel_aspect_num) /
-                     static_cast<double>(pixel_aspect_den) +
-                 0.5);
-  if (!(square >= 1.0)) return 1;  // also a ratio of 0 : 0
-  return static_cast<std::uint32_t>(std::min(square, 4294967295.0));
-}
-
-float ClipGeometry::pixel_aspect() const {
-  return static_cast<float>(static_cast<double>(square_width()) / static_cast<double>(width));
-}
-
-SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeometry& clip) {
+SolverParamsRecord GetSolverParams(const ParameterReader& params, const SourceShape& source,
+                                   double frame_rate) {
   const auto real = [&params](std::int32_t index) {
     return static_cast<float>(params.GetFloatParam(index));
   };
   const bool enhanced = params.GetPopupParam(kRollingShutterRippleIndex) ==
                         static_cast<int>(RollingShutterRipple::enhanced_reduction);
   const auto framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
-  const double larger_side = std::max(clip.square_width(), clip.height);
+  const double larger_side = std::max(source.square_width(), source.square_height());
   SolverParamsRecord record;
 
   record.rank = params.GetIntParam(kRankIndex);
@@ -69,7 +56,7 @@ SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeom
   if (record.homography_limit == 0) record.homography_limit = enhanced ? 100.0f : 50.0f;
   record.method_level = static_cast<float>(params.GetPopupParam(kMethodIndex) -
                                            (1.0 - params.GetFloatParam(kWarpFactorIndex) / 10.0));
-  record.pixel_aspect = clip.pixel_aspect();
+  record.pixel_aspect = source.pixel_aspect();
 
   record.crop = crops(framing);
   record.action_safe_margin =
@@ -91,41 +78,9 @@ SolverParamsRecord GetSolverParams(const ParameterReader& params, const ClipGeom
     record.path_gaussian_sigma =
         more == 1.0 ? 1000000.0f
                     : static_cast<float>(((std::clamp(more, 0.5, 1.0) - 0.5) * 2.0 * 18.0 + 2.0) *
-                                         clip.frame_rate);
+                                         frame_rate);
   }
   return record;
-}
-
-ParameterValues ValuesOf(const Controls& controls) {
-  ParameterValues values;
-  values[kResultIndex] = static_cast<int>(controls.result);
-  values[kSmoothnessIndex] = controls.smoothness;
-  values[kMethodIndex] = static_cast<int>(controls.method);
-  values[kFramingIndex] = static_cast<int>(controls.framing);
-  values[kMaximumScaleIndex] = controls.maximum_scale;
-  values[kActionSafeMarginIndex] = controls.action_safe_margin;
-  values[kAdditionalScaleIndex] = controls.additional_scale;
-  values[kDetailedAnalysisIndex] = controls.detailed_analysis;
-  values[kRollingShutterRippleIndex] = static_cast<int>(controls.rolling_shutter_ripple);
-  values[kCropLessSmoothMoreIndex] = controls.crop_less_smooth_more;
-  values[kSynthesisInputRangeIndex] = controls.synthesis_input_range;
-  values[kSynthesisEdgeFeatherIndex] = controls.synthesis_edge_feather;
-  return values;
-}
-
-SelectorParams MakeSelectorParams(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  return analysis::effect::GetSelectorParams(TableReader(values, false), clip.width, clip.height);
-}
-
-TrackerParams MakeTrackerParams(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  return analysis::effect::GetTrackerParams(TableReader(values, false), clip.height);
-}
-
-SolverParamsRecord MakeSolverParams(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  return GetSolverParams(TableReader(values, false), clip);
 }
 
 }  // namespace kelp::effect

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cmath>
 
+#include "stabilizer/effect/src/parameter_table.h"
+
 namespace kelp::effect {
 
 using marrow::render::DeblurDebug;
@@ -51,18 +53,6 @@ std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate) {
   constexpr double kMost = 2147483647.0;
   const double frames = std::round(params.GetFloatParam(kSynthesisInputRangeIndex) * frame_rate);
   return frames > 0 ? static_cast<std::uint32_t>(std::min(frames, kMost)) : 0;
-}
-
-RenderSettings MakeRenderSettings(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  RenderSettings settings = GetRenderSettings(TableReader(values, false));
-  settings.synthesis_range = MakeMargin(controls, clip);
-  return settings;
-}
-
-std::uint32_t MakeMargin(const Controls& controls, const ClipGeometry& clip) {
-  const ParameterValues values = ValuesOf(controls);
-  return MarginInFrames(TableReader(values, false), clip.frame_rate);
 }
 
 }  // namespace kelp::effect

@@ -3,12 +3,12 @@
 #include <cstdint>
 
 #include "effect/parameter_reader.h"
-#include "stabilizer/effect/src/parameter_rules.h"
 #include "stabilizer/render/render_settings.h"
 
 // How parameters become the settings of a render.
 namespace kelp::effect {
 
+using marrow::render::Framing;
 using marrow::render::RenderSettings;
 
 // How the parameters ask for frames to be drawn; the synthesis range is MarginInFrames's to tell.
@@ -16,9 +16,5 @@ RenderSettings GetRenderSettings(const ParameterReader& params);
 
 // Synthesis Input Range in frames, halves away from zero; 0 unless the edges are synthesized.
 std::uint32_t MarginInFrames(const ParameterReader& params, double frame_rate);
-
-// The same of the controls, with the range; and the range alone.
-RenderSettings MakeRenderSettings(const Controls& controls, const ClipGeometry& clip);
-std::uint32_t MakeMargin(const Controls& controls, const ClipGeometry& clip);
 
 }  // namespace kelp::effect

@@ -104,10 +104,11 @@ class DirectRender {
 
 Renderer StabilizerEffect::MakeRenderer(const StabilizerState& state) const {
   const HX_InData& in = *context().in;
-  const double pixel_aspect = static_cast<double>(state.warper->frameWidth()) /
-                              std::max(state.source_width, std::int32_t{1});
+  const double pixel_aspect = static_cast<double>(state.solve_result->warper->frameWidth()) /
+                              std::max(state.source.width, std::int32_t{1});
   return marrow::render::makeRenderer(
-      CPWarperWarps(state.warper), static_cast<float>(ValueOfRatio(in.downsample_x) / pixel_aspect),
+      CPWarperWarps(state.solve_result->warper),
+      static_cast<float>(ValueOfRatio(in.downsample_x) / pixel_aspect),
       static_cast<float>(ValueOfRatio(in.downsample_y)));
 }
 
@@ -115,7 +116,8 @@ OutputRect StabilizerEffect::SetUpOutput() {
   const OutputRect input = InputRect(*context().in);
   const auto framing = static_cast<Framing>(GetPopupParam(kFramingIndex));
   const StabilizerState* const state = GetState();
-  if (IsOneByOne() || !state || !state->warper || crops(framing) || !IsRenderableFrame()) {
+  if (IsOneByOne() || !state || !state->solve_result->warper || crops(framing) ||
+      !IsRenderableFrame()) {
     return input;
   }
   return setupOutputRect(framing, MakeRenderer(*state), input.width, input.height);
@@ -134,15 +136,15 @@ void StabilizerEffect::PrepareFrame() {
 
 std::int64_t StabilizerEffect::PlanMargin(const StabilizerState& state) {
   const EffectParameters params(*this);
-  return std::max<std::int64_t>(MarginInFrames(params, state.Geometry().frame_rate),
+  return std::max<std::int64_t>(MarginInFrames(params, state.FrameRate()),
                                 deblurReach(GetRenderSettings(params).deblur));
 }
 
 FrameClock StabilizerEffect::ClockOf(const StabilizerState& state) {
   const analysis::JobInput present = analysis::ReadJobInput(context().in, context().out);
   const std::int64_t start = analysis::FloorSteps(present.StartTime, present.StepTime);
-  return {analysis::CountsFields(state.job_input) ? 2 * start : start,
-          analysis::RowDuration(state.job_input)};
+  return {analysis::CountsFields(state.result->job_input) ? 2 * start : start,
+          analysis::RowDuration(state.result->job_input)};
 }
 
 void StabilizerEffect::PlanFrame() {
@@ -175,10 +177,10 @@ void StabilizerEffect::PlanFrame() {
     const FrameClock clock = ClockOf(state);
     const std::int64_t margin = PlanMargin(state);
     const std::int64_t first =
-        std::max<std::int64_t>({current.frame - margin, state.first_frame, 0});
+        std::max<std::int64_t>({current.frame - margin, state.table().first_frame, 0});
     const std::int64_t end =
         std::min<std::int64_t>(current.frame + margin + 1,
-                               std::int64_t{state.first_frame} + state.all_features.frame_count);
+                               std::int64_t{state.table().first_frame} + state.table().frame_count);
     for (std::int64_t frame = first; frame < end; ++frame) {
       const HostTime at = clock.At(frame);
       ThrowIfFailed(plan.checkout_layer(in.effect_ref, 0, static_cast<std::int32_t>(frame), &whole,
@@ -245,10 +247,10 @@ template <class Pixel>
 bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) {
   const StabilizerState& state = *GetState();
   const CurrentFrame current = GetCurrentFrame(true);
-  const std::int64_t row = current.frame - state.first_frame;
-  if (!state.warper || !current.valid || row < 0) return false;
+  const std::int64_t row = current.frame - state.table().first_frame;
+  if (!state.solve_result->warper || !current.valid || row < 0) return false;
   const auto frame = static_cast<std::size_t>(row);
-  if (frame >= state.warper->frameWarpCount()) return false;
+  if (frame >= state.solve_result->warper->frameWarpCount()) return false;
 
   const EffectParameters params(*this);
   RenderSettings settings = GetRenderSettings(params);
@@ -260,12 +262,12 @@ bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) 
   const OutputRect setup = SetUpOutput();
   settings.shift_x = static_cast<double>(output.origin_x) + setup.origin_x;
   settings.shift_y = static_cast<double>(output.origin_y) + setup.origin_y;
-  settings.synthesis_range = MarginInFrames(params, state.Geometry().frame_rate);
+  settings.synthesis_range = MarginInFrames(params, state.FrameRate());
   Renderer renderer = MakeRenderer(state);
-  ClipFrames<Pixel> clip(frames, state.first_frame);
+  ClipFrames<Pixel> clip(frames, state.table().first_frame);
   HostOperations<Pixel> operations(context());
-  renderFrame(CPWarperWarps(state.warper), state.crop.get(), settings, renderer, frame, clip,
-              operations, pixels);
+  renderFrame(CPWarperWarps(state.solve_result->warper), state.solve_result->crop.get(), settings,
+              renderer, frame, clip, operations, pixels);
   if (!crops(settings.framing)) SendPolygon(state, frame, renderer, settings, setup);
   return true;
 }
@@ -273,8 +275,9 @@ bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) 
 void StabilizerEffect::SendPolygon(const StabilizerState& state, std::size_t frame,
                                    const Renderer& renderer, const RenderSettings& settings,
                                    const OutputRect& setup) {
-  const std::vector<float> polygon = outlinePolygon(CPWarperWarps(state.warper), frame, renderer,
-                                                    settings, setup.origin_x, setup.origin_y);
+  const std::vector<float> polygon =
+      outlinePolygon(CPWarperWarps(state.solve_result->warper), frame, renderer, settings,
+                     setup.origin_x, setup.origin_y);
   const ScopedSuite<HX_StabilizerHostSuite7> suite(context());
   ThrowIfFailed(suite->SetFramePolygon(context().in->effect_ref,
                                        static_cast<std::uint32_t>(polygon.size() / 2),

@@ -19,12 +19,13 @@ static_assert(sizeof(HX_VarVector) == sizeof(VarVector) &&
 
 namespace {
 
-// Calls read(contents) under the lock; `otherwise` without a block.
+// Calls read(contents) under the lock; `otherwise` without a block, and where nothing is published.
 template <class Result, class Read>
 Result ReadBlock(const void* block, Result otherwise, const Read& read) {
   if (!block) return otherwise;
   const auto& shared = *static_cast<const StabilizerSharedData*>(block);
   const std::shared_lock<std::shared_mutex> lock(shared.lock);
+  if (!shared.contents.result) return otherwise;
   return read(shared.contents);
 }
 
@@ -44,8 +45,9 @@ std::uint8_t allowCUDARendering(const void* block) {
 const HX_VarVector* getOVVarVector(const void* block, std::int32_t frame) {
   thread_local boost::shared_ptr<const VarVector> held;
   held = ReadBlock(block, boost::shared_ptr<const VarVector>(), [frame](const Contents& shared) {
-    return shared.warper ? shared.warper->frameWarp(static_cast<std::size_t>(frame))
-                         : boost::shared_ptr<const VarVector>();
+    const auto& warper = shared.solve_result->warper;
+    return warper ? warper->frameWarp(static_cast<std::size_t>(frame))
+                  : boost::shared_ptr<const VarVector>();
   });
   return reinterpret_cast<const HX_VarVector*>(held.get());
 }
@@ -53,8 +55,9 @@ const HX_VarVector* getOVVarVector(const void* block, std::int32_t frame) {
 void getCropWindow(const void* block, std::int32_t frame, float* left, float* top, float* right,
                    float* bottom) {
   ReadBlock(block, false, [&](const Contents& shared) {
-    if (!shared.crop || shared.crop->rects.empty()) return false;
-    const crop_rect& rect = shared.crop->rects[static_cast<std::size_t>(frame)];
+    const auto& crop = shared.solve_result->crop;
+    if (!crop || crop->rects.empty()) return false;
+    const crop_rect& rect = crop->rects[static_cast<std::size_t>(frame)];
     *left = rect.left;
     *top = rect.top;
     *right = rect.right;
@@ -70,22 +73,24 @@ std::uint8_t getStabilizerData(const void* block, std::int32_t* frame_count,
                                float* max_y, std::int32_t* source_width,
                                std::int32_t* source_height) {
   return ReadBlock(block, std::uint8_t{0}, [&](const Contents& shared) {
-    if (!shared.warper) return std::uint8_t{0};
-    const auto& bounds = shared.warper->unionBounds();
-    *frame_count = static_cast<std::int32_t>(shared.warper->frameWarpCount());
-    *first_frame = shared.first_frame;
-    *grid_columns = shared.warper->gridCols();
-    *grid_rows = shared.warper->gridRows();
-    if (shared.crop) {
-      *crop_width = shared.crop->cropWidth;
-      *crop_height = shared.crop->cropHeight;
+    const auto& warper = shared.solve_result->warper;
+    const auto& crop = shared.solve_result->crop;
+    if (!warper) return std::uint8_t{0};
+    const auto& bounds = warper->unionBounds();
+    *frame_count = static_cast<std::int32_t>(warper->frameWarpCount());
+    *first_frame = shared.result->all_features.first_frame;
+    *grid_columns = warper->gridCols();
+    *grid_rows = warper->gridRows();
+    if (crop) {
+      *crop_width = crop->cropWidth;
+      *crop_height = crop->cropHeight;
     }
     *min_x = static_cast<float>(bounds.min_x);
     *min_y = static_cast<float>(bounds.min_y);
     *max_x = static_cast<float>(bounds.max_x);
     *max_y = static_cast<float>(bounds.max_y);
-    *source_width = shared.source_width;
-    *source_height = shared.source_height;
+    *source_width = shared.source.width;
+    *source_height = shared.source.height;
     return std::uint8_t{1};
   });
 }

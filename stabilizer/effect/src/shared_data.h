@@ -1,16 +1,12 @@
 #pragma once
 
 #include <boost/shared_ptr.hpp>
-#include <cstdint>
 #include <shared_mutex>
 
+#include "analysis/src/analysis_result.h"
 #include "analysis/src/analyzer.h"
-#include "analysis/src/job_input.h"
-#include "platform/tessel/guid.h"
-#include "stabilization/crop/cropper.h"
-#include "stabilization/warp/cp_warper.h"
-#include "stabilizer/effect/src/solve_phase.h"
-#include "tracking/track_store.h"
+#include "effect/source_shape.h"
+#include "stabilizer/effect/src/solve_result.h"
 
 namespace kelp::effect {
 
@@ -22,25 +18,18 @@ struct StabilizerSharedData {
   mutable std::shared_mutex lock;  // guards everything below; PublishSharedData is the one writer
 
   struct Contents {
-    boost::shared_ptr<const marrow::stabilization::CPWarper> warper;
-    boost::shared_ptr<const cropper> crop;
-    analysis::JobInput job_input;
-    tessel::utility::Guid source_identity;
-    tessel::utility::Guid tracker_identity;
-    // A header of its own over the cells that all share; null before the first publishing.
-    boost::shared_ptr<const marrow::tracking::AllFeatures> all_features;
-    std::uint64_t feature_count = 0;
-    std::int32_t first_frame = 0;
-    std::int32_t source_width = 0, source_height = 0;
-    std::int32_t par_num = 1;
-    std::uint32_t par_den = 1;
+    SourceShape source;
+    // Null before the first publishing, both at once.
+    boost::shared_ptr<const analysis::AnalysisResult> result;
+    boost::shared_ptr<const SolveResult> solve_result;
     boost::shared_ptr<analysis::Analyzer> analyzer;
-    SolvePhase solve_status = SolvePhase::None;
-    bool needs_solve = false;
-    bool gpu_allowed = false;
-    bool first_solve = false;
-    bool subsequent_solve = false;
-  } contents;
+    // Without defaults, so that whoever makes them names them all.
+    SolvePhase phase;
+    bool needs_solve;
+    bool first_analysis;
+    bool subsequent_solve;
+    bool gpu_allowed;  // outside renderers may draw the frames
+  } contents{};
 };
 
 }  // namespace kelp::effect

@@ -27,9 +27,10 @@ void StabilizerEffect::PublishSharedData() {
   if (!state || !state->shared || state->keep_jobs) return;
   // The status asks the host, so it comes last and ahead of the lock.
   const auto framing = static_cast<Framing>(GetPopupParam(kFramingIndex));
-  const bool gpu_allowed = state->warper && framing != Framing::synthesize_edges &&
-                           (!crops(framing) || state->crop) &&
-                           GetStatusForFrame(state->first_frame) == FrameStatus::Ready;
+  const SolveResult& solve = *state->solve_result;
+  const bool gpu_allowed = solve.warper && framing != Framing::synthesize_edges &&
+                           (!crops(framing) || solve.crop) &&
+                           GetStatusForFrame(state->table().first_frame) == FrameStatus::Ready;
   state->Publish(gpu_allowed);
 }
 

@@ -96,30 +96,28 @@ bool StabilizerEffect::ServiceAnalysis(bool from_render) {
 void StabilizerEffect::CheckSolveParams(StabilizerState& state) {
   const auto status = state.SolveStatus();
   if (state.analyzer || (status != Solver::finished && status != Solver::failed)) return;
-  const HX_InData& in = *context().in;
-  if (in.width != state.source_width || in.height != state.source_height) {
+  const SourceShape present = ShapeOf(*context().in);
+  if (!present.SameSize(state.source)) {
     ReportSizeMismatch(state);
     state.needs_solve = false;
     return;
   }
   // The tracks are in the source's pixels, whatever their aspect is said to be.
-  state.par_num = in.pixel_aspect.num;
-  state.par_den = in.pixel_aspect.den;
+  state.source = present;
 
   const EffectParameters params(*this);
-  const ClipGeometry clip = state.Geometry();
-  const SolverParamsRecord record = GetSolverParams(params, clip);
+  const SolverParamsRecord record = GetSolverParams(params, state.source, state.FrameRate());
   const auto framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
   const auto deletions = analysis::effect::ReadDeletedTrackPoints(*this);
   bool needed = state.needs_solve && state.has_frames();
-  if (SolveHash(record) != state.solve_hash) {
+  if (SolveHash(record) != state.solve_result->solve_hash) {
     needed = true;
   } else if (deletions && !state.WasSolvedWithout(*deletions)) {
     needed = state.subsequent_solve = true;
   } else if (!needed && crops(framing)) {
-    needed = CropHash(record) != state.crop_hash;
+    needed = CropHash(record) != state.solve_result->crop_hash;
   } else if (!needed && status == Solver::finished) {
-    needed = MarginInFrames(params, clip.frame_rate) > state.FrameMapRadius();
+    needed = MarginInFrames(params, state.FrameRate()) > state.FrameMapRadius();
   }
   if (!needed) return;
   const bool known = state.needs_solve;
@@ -131,10 +129,10 @@ void StabilizerEffect::CheckSolveParams(StabilizerState& state) {
 bool StabilizerEffect::StartSolveIfNeeded(StabilizerState& state) {
   if (!state.needs_solve || !state.has_frames()) return false;
   const EffectParameters params(*this);
-  const ClipGeometry clip = state.Geometry();
   const bool started = state.StartSolve(
-      GetSolverParams(params, clip), MarginInFrames(params, clip.frame_rate),
-      analysis::effect::ReadDeletedTrackPoints(*this), [this]() -> boost::function<void()> {
+      GetSolverParams(params, state.source, state.FrameRate()),
+      MarginInFrames(params, state.FrameRate()), analysis::effect::ReadDeletedTrackPoints(*this),
+      [this]() -> boost::function<void()> {
         const auto notifier = boost::make_shared<const SolveNotifier>(context());
         return [notifier] { (*notifier)(); };
       });
@@ -162,13 +160,11 @@ void StabilizerEffect::FinishSolve(StabilizerState& state) {
 }
 
 void StabilizerEffect::ReportSizeMismatch(StabilizerState& state) {
-  const analysis::SourceSize present{context().in->width, context().in->height};
-  const bool told =
-      state.reported_size.width == present.width && state.reported_size.height == present.height;
+  const SourceShape present = ShapeOf(*context().in);
+  const bool told = state.reported_source.SameSize(present);
   if (told || IsOneByOne() || !state.has_frames()) return;
-  state.reported_size = present;
-  analysis::ReportSizeMismatch(context().in, context().out, kEffectName,
-                               {state.source_width, state.source_height}, present,
+  state.reported_source = present;
+  analysis::ReportSizeMismatch(context().in, context().out, kEffectName, state.source, present,
                                analysis::AfterReport::GoOn);
 }
 
@@ -211,7 +207,8 @@ void StabilizerEffect::ShowSolveProgress(const StabilizerState& state) {
 }
 
 void StabilizerEffect::ShowAutoScale(const StabilizerState& state) {
-  if (!state.warper || !state.crop || state.crop->rects.empty()) return;
+  const SolveResult& solve = *state.solve_result;
+  if (!solve.warper || !solve.crop || solve.crop->rects.empty()) return;
   Renderer scratch = MakeRenderer(state);
   const double zoom = state.GetZoom(EffectParameters(*this), scratch, true, false);
   const std::string text =

@@ -11,11 +11,12 @@
 
 namespace kelp::effect {
 
+using analysis::AnalysisResult;
 using analysis::FrameStatus;
+using analysis::Replace;
 using analysis::effect::DeletedTrackPoints;
 using marrow::render::CPWarperWarps;
 using marrow::stabilization::SolverParamsRecord;
-using marrow::tracking::AllFeatures;
 using tessel::utility::Guid;
 
 namespace {
@@ -23,10 +24,7 @@ constexpr std::int64_t kNoParametersHash = std::int64_t{1} << 32;
 }  // namespace
 
 StabilizerState::StabilizerState(const HX_InData& in, bool keeps_jobs) {
-  source_width = in.width;
-  source_height = in.height;
-  par_num = in.pixel_aspect.num;
-  par_den = in.pixel_aspect.den;
+  source = ShapeOf(in);
   keep_jobs = keeps_jobs;
 }
 
@@ -36,17 +34,11 @@ bool StabilizerState::IsWorkingOnResults() const {
   return solver && solver->GetState() == Solver::running;
 }
 
-ClipGeometry StabilizerState::Geometry() const {
-  ClipGeometry clip;
-  clip.width = static_cast<std::uint32_t>(std::max(source_width, 1));
-  clip.height = static_cast<std::uint32_t>(std::max(source_height, 1));
-  clip.pixel_aspect_num = par_num;
-  clip.pixel_aspect_den = par_den;
-  const analysis::RationalTime& step = job_input.StepTime;
-  clip.frame_rate = step.numerator > 0 ? static_cast<double>(step.denominator) /
-                                             static_cast<double>(step.numerator)
-                                       : 0.0;
-  return clip;
+double StabilizerState::FrameRate() const {
+  const analysis::RationalTime& step = result->job_input.StepTime;
+  return step.numerator > 0
+             ? static_cast<double>(step.denominator) / static_cast<double>(step.numerator)
+             : 0.0;
 }
 
 std::optional<Solver::State> StabilizerState::SolveStatus() const {
@@ -75,7 +67,9 @@ bool StabilizerState::IsAtWorkOn(const Solver::Inputs& inputs) const {
 // Equality of all that the warps were made from decides, whatever changed meanwhile and changed
 // back. A warper that was read from a project can't be given a wider map: it has no tracks.
 bool StabilizerState::MayReuseWarper(const Solver::Inputs& inputs) const {
-  return warper && phase == SolvePhase::Solved && SolveHash(inputs.parameters) == solve_hash &&
+  const auto& warper = solve_result->warper;
+  return warper && phase == SolvePhase::Solved &&
+         SolveHash(inputs.parameters) == solve_result->solve_hash &&
          solve_input_identity == result_identity && deletion_identity == marked_deletions_ &&
          warper->frameCount() == inputs.features.frame_count &&
          static_cast<std::uint32_t>(warper->frameWidth()) == inputs.width &&
@@ -83,23 +77,11 @@ bool StabilizerState::MayReuseWarper(const Solver::Inputs& inputs) const {
          (warper->driven() || inputs.frameMapRadius <= FrameMapRadius());
 }
 
-AllFeatures StabilizerState::Table() const {
-  AllFeatures table = all_features;
-  table.first_frame = first_frame;
-  return table;
-}
-
-AllFeatures StabilizerState::TableWithout(const DeletedTrackPoints& deletions) const {
-  AllFeatures table = all_features;
-  table.features = ApplyDeletedTrackPoints(Table(), deletions.Points()).features;
-  return table;
-}
-
 bool StabilizerState::WasSolvedWithout(const DeletedTrackPoints& deletions) {
   const Guid identity = deletions.Identity();
   if (identity == deletion_identity) return true;
   if (!deletions_from_project_) return false;
-  const DeletedTrackPoints seeds(SeedsOf(Table(), deletions.Points()));
+  const DeletedTrackPoints seeds(SeedsOf(table(), deletions.Points()));
   if (seeds.Identity() != deletion_identity) return false;
   deletion_identity = marked_deletions_ = identity;
   return true;
@@ -116,12 +98,15 @@ bool StabilizerState::StartSolve(const SolverParamsRecord& parameters,
                                  const boost::function<boost::function<void()>()>& make_notify) {
   const std::optional<Solver::State> status = SolveStatus();
   if (status == Solver::not_started) return false;
-  const ClipGeometry clip = Geometry();
   const Guid wanted = deletions ? deletions->Identity() : marked_deletions_;
   const bool same_tracks = wanted == marked_deletions_;
   const Solver::Inputs inputs{
-      clip.square_width(), clip.height, same_tracks ? all_features : TableWithout(*deletions),
-      frame_map_radius,    parameters,  parameters.crop};
+      source.square_width(),
+      source.square_height(),
+      same_tracks ? table() : ApplyDeletedTrackPoints(table(), deletions->Points()),
+      frame_map_radius,
+      parameters,
+      parameters.crop};
   if ((status == Solver::running || status == Solver::failed) && same_tracks &&
       IsAtWorkOn(inputs)) {
     return false;
@@ -130,10 +115,12 @@ bool StabilizerState::StartSolve(const SolverParamsRecord& parameters,
   auto next = boost::make_shared<Solver>(inputs.width, inputs.height, inputs.features,
                                          inputs.frameMapRadius, inputs.parameters,
                                          inputs.needsCropper, make_notify());
+  if (!same_tracks) {
+    Replace(result, [&inputs](AnalysisResult& marked) { marked.all_features = inputs.features; });
+  }
   solver.reset();
-  all_features = inputs.features;
   marked_deletions_ = wanted;
-  if (MayReuseWarper(inputs)) next->SetExistingWarper(warper);
+  if (MayReuseWarper(inputs)) next->SetExistingWarper(solve_result->warper);
   next->Start();
   solver = std::move(next);
   return true;
@@ -141,20 +128,18 @@ bool StabilizerState::StartSolve(const SolverParamsRecord& parameters,
 
 void StabilizerState::TakeSolve() {
   const Solver::Inputs& inputs = solver->inputs();
-  if (solver->GetState() == Solver::finished) {
-    phase = SolvePhase::Solved;
-    warper = solver->GetWarper();
-    crop = solver->GetCropper();
-  } else {
-    // The old warps would pass for ones that fit the hashes of what failed.
-    phase = SolvePhase::Failed;
-    warper.reset();
-    crop.reset();
+  const bool finished = solver->GetState() == Solver::finished;
+  const auto next = boost::make_shared<SolveResult>();
+  if (finished) {  // the old warps would pass for ones that fit the hashes of what failed
+    next->warper = solver->GetWarper();
+    next->crop = solver->GetCropper();
   }
-  solve_hash = SolveHash(inputs.parameters);
-  crop_hash = CropHash(inputs.parameters);
+  next->solve_hash = SolveHash(inputs.parameters);
+  next->crop_hash = CropHash(inputs.parameters);
+  solve_result = next;
   solve_input_identity = result_identity;
   deletion_identity = marked_deletions_;
+  phase = finished ? SolvePhase::Solved : SolvePhase::Failed;
   deletions_from_project_ = false;
   needs_solve = false;
   subsequent_solve = false;
@@ -162,6 +147,7 @@ void StabilizerState::TakeSolve() {
 }
 
 std::uint32_t StabilizerState::FrameMapRadius() const {
+  const auto& warper = solve_result->warper;
   return warper && warper->frameMap() ? static_cast<std::uint32_t>(warper->frameMap()->radius())
                                       : 0;
 }
@@ -171,38 +157,29 @@ double StabilizerState::GetZoom(const ParameterReader& params, Renderer& rendere
   RenderSettings settings = GetRenderSettings(params);
   if (!use_additional_scale) settings.additional_scale = 1.0f;
   if (!auto_scale) return settings.additional_scale;
-  return marrow::render::getZoom(CPWarperWarps(warper), crop.get(), settings, renderer);
+  return marrow::render::getZoom(CPWarperWarps(solve_result->warper), solve_result->crop.get(),
+                                 settings, renderer);
 }
 
 bool StabilizerState::IsOverCropped(const ParameterReader& params) const {
-  if (!warper || !crop) return false;
+  if (!solve_result->warper || !solve_result->crop) return false;
   const RenderSettings settings = GetRenderSettings(params);
   if (!crops(settings.framing)) return false;
-  const CPWarperWarps warps(warper);
+  const CPWarperWarps warps(solve_result->warper);
   Renderer renderer = makeRenderer(warps, 1.0f, 1.0f);
-  return isOvercropped(warps, *crop, settings, renderer);
+  return isOvercropped(warps, *solve_result->crop, settings, renderer);
 }
 
 void StabilizerState::Publish(bool gpu_allowed) const {
-  StabilizerSharedData::Contents contents;
-  contents.warper = warper;
-  contents.crop = crop;
-  contents.job_input = job_input;
-  contents.source_identity = source_identity;
-  contents.tracker_identity = tracker_identity;
-  contents.all_features = boost::make_shared<marrow::tracking::AllFeatures>(all_features);
-  contents.feature_count = static_cast<std::uint64_t>(all_features.feature_count);
-  contents.first_frame = first_frame;
-  contents.source_width = source_width;
-  contents.source_height = source_height;
-  contents.par_num = par_num;
-  contents.par_den = par_den;
-  contents.analyzer = analyzer;
-  contents.solve_status = phase;
-  contents.needs_solve = needs_solve;
-  contents.gpu_allowed = gpu_allowed;
-  contents.first_solve = first_analysis;
-  contents.subsequent_solve = subsequent_solve;
+  StabilizerSharedData::Contents contents{.source = source,
+                                          .result = result,
+                                          .solve_result = solve_result,
+                                          .analyzer = analyzer,
+                                          .phase = phase,
+                                          .needs_solve = needs_solve,
+                                          .first_analysis = first_analysis,
+                                          .subsequent_solve = subsequent_solve,
+                                          .gpu_allowed = gpu_allowed};
   {
     const std::unique_lock<std::shared_mutex> lock(shared->lock);
     std::swap(shared->contents, contents);
@@ -217,80 +194,61 @@ void StabilizerState::TakeOver() {
     const std::shared_lock<std::shared_mutex> lock(shared->lock);
     contents = shared->contents;
   }
-  if (!contents.all_features) return;  // nothing was published yet
-  warper = std::move(contents.warper);
-  crop = std::move(contents.crop);
-  job_input = std::move(contents.job_input);
-  source_identity = contents.source_identity;
-  tracker_identity = contents.tracker_identity;
-  if (keep_jobs || !has_frames()) {
-    all_features = *contents.all_features;
-    first_frame = contents.first_frame;
+  if (!contents.result) return;  // nothing was published yet
+  if (!keep_jobs && has_frames() && contents.result != result) {
+    Replace(contents.result, [this](AnalysisResult& next) { next.all_features = table(); });
   }
-  source_width = contents.source_width;
-  source_height = contents.source_height;
-  par_num = contents.par_num;
-  par_den = contents.par_den;
-  if (keep_jobs) analyzer = std::move(contents.analyzer);
-  phase = contents.solve_status;
+  source = contents.source;
+  result = contents.result;
+  solve_result = contents.solve_result;
+  if (keep_jobs) analyzer = contents.analyzer;
+  phase = contents.phase;
   needs_solve = contents.needs_solve;
-  first_analysis = contents.first_solve;
+  first_analysis = contents.first_analysis;
   subsequent_solve = contents.subsequent_solve;
 }
 
 SavedState StabilizerState::Save() const {
-  SavedState saved;
-  saved.source_width = source_width;
-  saved.source_height = source_height;
-  saved.par_num = par_num;
-  saved.par_den = par_den;
-  saved.all_features = all_features;
-  saved.all_features.first_frame = first_frame;
-  saved.job_input = job_input;
-  saved.tracker_identity = tracker_identity;
-  saved.source_identity = source_identity;
-  saved.analysis_tick = progress.start_tick;
-  saved.detailed = detailed;
+  SavedState saved{.source = source,
+                   .result = result,
+                   .solve_result = solve_result,
+                   .phase = phase,
+                   .needs_solve = needs_solve,
+                   .analysis_tick = progress.start_tick,
+                   .detailed = detailed,
+                   .analysis_pending = false,
+                   .job = {}};
   if (analyzer) saved.job = analyzer->record();
-  saved.needs_solve = needs_solve;
-  saved.phase = phase;
-  saved.solve_hash = solve_hash;
-  // The table tells of other deletions than the warps are of.
-  if (deletion_identity != marked_deletions_) saved.solve_hash = kNoParametersHash;
-  saved.crop_hash = crop_hash;
-  if (phase == SolvePhase::Solved) {
-    saved.warper = warper;
-    saved.crop = crop;
+  // The table may tell of other deletions than the warps are of.
+  const bool same_deletions = deletion_identity == marked_deletions_;
+  if (!same_deletions || phase != SolvePhase::Solved) {
+    Replace(saved.solve_result, [&](SolveResult& next) {
+      if (!same_deletions) next.solve_hash = kNoParametersHash;
+      if (phase == SolvePhase::Solved) return;
+      next.warper.reset();
+      next.crop.reset();
+    });
   }
   return saved;
 }
 
 void StabilizerState::Load(const SavedState& saved, const analysis::JobFactory& make_job) {
-  source_width = saved.source_width;
-  source_height = saved.source_height;
-  par_num = saved.par_num;
-  par_den = saved.par_den;
-  all_features = saved.all_features;
-  first_frame = saved.all_features.first_frame;
-  job_input = saved.job_input;
-  tracker_identity = saved.tracker_identity;
-  source_identity = saved.source_identity;
+  source = saved.source;
+  result = saved.result;
+  solve_result = saved.solve_result;
+  phase = saved.phase;
+  needs_solve = saved.needs_solve;
   progress.start_tick = saved.analysis_tick;
   detailed = saved.detailed;
   if (saved.job) {
-    analyzer = boost::make_shared<analysis::AnalyzerPrem>(*saved.job, source_identity, make_job);
+    analyzer =
+        boost::make_shared<analysis::AnalyzerPrem>(*saved.job, result->source_identity, make_job);
     analysis_pending = saved.analysis_pending;  // else frames would wait for nothing
   }
-  needs_solve = saved.needs_solve;
-  phase = saved.phase;
-  solve_hash = saved.solve_hash;
-  crop_hash = saved.crop_hash;
-  warper = saved.warper;
-  crop = saved.crop;
   MakeResultIdentityUnique();
   solve_input_identity = result_identity;
   deletion_identity = marked_deletions_ =
-      DeletedTrackPoints(marrow::tracking::DeletedSeeds(Table())).Identity();
+      DeletedTrackPoints(marrow::tracking::DeletedSeeds(table())).Identity();
   deletions_from_project_ = true;
 }
 

@@ -7,14 +7,12 @@
 
 #include "analysis/effect/deleted_track_points.h"
 #include "analysis/src/analysis_state.h"
-#include "analysis/src/state_errors.h"
 #include "analysis/src/validity.h"
 #include "effect/parameter_reader.h"
 #include "platform/hx/hx_effect.h"
-#include "stabilizer/effect/src/parameter_rules.h"
 #include "stabilizer/effect/src/render_rules.h"
 #include "stabilizer/effect/src/shared_data.h"
-#include "stabilizer/effect/src/solve_phase.h"
+#include "stabilizer/effect/src/solve_result.h"
 #include "stabilizer/effect/src/solver.h"
 #include "stabilizer/effect/src/state_format/saved_state.h"
 #include "stabilizer/render/render_geometry.h"
@@ -39,9 +37,9 @@ class StabilizerState final : public analysis::AnalysisState {
   // No track of the new results is deleted.
   void MakeResultIdentityUnique() override;
 
-  bool has_frames() const { return all_features.frame_count > 0; }
-  // Of the analysed source. No frames a second without a job input.
-  ClipGeometry Geometry() const;
+  bool has_frames() const { return table().frame_count > 0; }
+  // Frames a second of the analysed source; none without a job input.
+  double FrameRate() const;
 
   // That of the Solver, else how the last one ended; none if none has.
   std::optional<Solver::State> SolveStatus() const;
@@ -52,7 +50,7 @@ class StabilizerState final : public analysis::AnalysisState {
   // thread; whether it did. One at work on other inputs is dropped. Where the stored warps fit,
   // only the frame map and the crop are made anew. make_notify gives what the Solver calls at its
   // end; what it throws leaves everything as it was. The tracks of the deletions are left out and
-  // marked in all_features; without a set, those stay deleted that are.
+  // marked in the table; without a set, those stay deleted that are.
   bool StartSolve(const marrow::stabilization::SolverParamsRecord& parameters,
                   std::uint32_t frame_map_radius,
                   const std::optional<analysis::effect::DeletedTrackPoints>& deletions,
@@ -76,9 +74,10 @@ class StabilizerState final : public analysis::AnalysisState {
   // The crop window, as shown, is under two fifths of the frame.
   bool IsOverCropped(const ParameterReader& params) const;
 
-  // Both ways between a state and what its renders share. Publish's gpu_allowed: whether an outside
-  // renderer may draw the frames. TakeOver leaves the track table and the analyzer of a user
-  // interface instance alone, so that neither a save nor a poll loses them.
+  // Both ways between a state and what its renders share: pointers to records, which neither side
+  // writes. Publish's gpu_allowed: whether an outside renderer may draw the frames. TakeOver leaves
+  // the track table and the analyzer of a user interface instance alone, so that neither a save nor
+  // a poll loses them.
   void Publish(bool gpu_allowed) const;
   void TakeOver();
 
@@ -92,12 +91,8 @@ class StabilizerState final : public analysis::AnalysisState {
   bool needs_solve = false;
   bool subsequent_solve = false;  // the solve is of a changed deletion
   boost::shared_ptr<Solver> solver;
-  // Of a solved phase; published, so never written.
-  boost::shared_ptr<const marrow::stabilization::CPWarper> warper;
-  boost::shared_ptr<const cropper> crop;
-  // SolveHash and CropHash of the results' parameters; beyond 32 bits where no parameters may fit.
-  std::int64_t solve_hash = 0;
-  std::int64_t crop_hash = 0;
+  // Never null, and never written: renders hold it too.
+  boost::shared_ptr<const SolveResult> solve_result = boost::make_shared<SolveResult>();
   StabilizerSharedData* shared = nullptr;  // attached to; see StabilizerEffect::AttachSharedData
   // What the host still has to be told, where telling it has failed.
   analysis::FrameStatus unpublished = analysis::FrameStatus::None;
@@ -105,19 +100,15 @@ class StabilizerState final : public analysis::AnalysisState {
   // ordered frames for the warp. The render keeps to it, whatever the host answers meanwhile.
   std::int32_t planned_input = 0;
   bool planned_warp = false;
-  // The size of the source about which the user was told last that the state is of another.
-  analysis::SourceSize reported_size;
+  // The source about which the user was told last that the state is of another.
+  SourceShape reported_source;
 
  private:
   bool IsAtWorkOn(const Solver::Inputs& inputs) const;
   bool MayReuseWarper(const Solver::Inputs& inputs) const;
-  // all_features by absolute frames.
-  marrow::tracking::AllFeatures Table() const;
-  marrow::tracking::AllFeatures TableWithout(
-      const analysis::effect::DeletedTrackPoints& deletions) const;
 
-  // Identity of the deletions that are marked in all_features, which are those of the Solver at
-  // work; deletion_identity is of the ones that the stored solve was made with.
+  // Identity of the deletions that are marked in the table, which are those of the Solver at work;
+  // deletion_identity is of the ones that the stored solve was made with.
   tessel::utility::Guid marked_deletions_;
   bool deletions_from_project_ = false;
 };

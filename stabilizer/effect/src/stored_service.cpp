@@ -48,11 +48,9 @@ std::string PayloadOf(const StabilizerState& state, bool raw) {
 }
 
 SavedState ReadPayload(const HostContext& context, HX_Handle handle) {
-  const HX_InData& in = *context.in;
   const InstanceHandleLock header(context, handle);
   return ReadState(&*header + 1, static_cast<std::size_t>(header->payload_length), header->version,
-                   header->raw != 0,
-                   {in.width, in.height, in.pixel_aspect.num, in.pixel_aspect.den});
+                   header->raw != 0, ShapeOf(*context.in));
 }
 
 // Tells the user why a payload is not taken, and throws StateDeserializationFailed.
@@ -64,9 +62,8 @@ SavedState ReadPayload(const HostContext& context, HX_Handle handle) {
 [[noreturn]] void Refuse(const HostContext& context, const StateRefused& refused) {
   switch (refused.reason) {
     case StateRefused::Reason::SourceSize:
-      analysis::ReportSizeMismatch(context.in, context.out, kEffectName,
-                                   {refused.stored_width, refused.stored_height},
-                                   {context.in->width, context.in->height}, AfterReport::GoOn);
+      analysis::ReportSizeMismatch(context.in, context.out, kEffectName, refused.stored,
+                                   ShapeOf(*context.in), AfterReport::GoOn);
       throw analysis::StateDeserializationFailed(refused.what());
     case StateRefused::Reason::Grid:
       Refuse(context, kGridMismatch);

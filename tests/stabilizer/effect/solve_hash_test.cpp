@@ -6,22 +6,15 @@
 
 #include "platform/tessel/utility.h"
 #include "stabilizer/effect/src/parameter_rules.h"
+#include "tests/support/parameter_values.h"
 
 namespace kelp::effect {
 namespace {
 
 using marrow::stabilization::SolverParamsRecord;
 
-ClipGeometry FullHD() {
-  ClipGeometry clip;
-  clip.width = 1920;
-  clip.height = 1080;
-  clip.frame_rate = 25;
-  return clip;
-}
-
-SolverParamsRecord RecordOf(const ParameterValues& values, bool shows_experimental = true) {
-  return GetSolverParams(TableReader(values, shows_experimental), FullHD());
+SolverParamsRecord RecordOf(const ParameterValues& values) {
+  return GetSolverParams(values, {1920, 1080}, 25);
 }
 
 // Numbers found by packing the fields with a script.
@@ -41,9 +34,15 @@ TEST(SolveHashTest, WorkedNumbers) {
   EXPECT_EQ(with(kSmoothnessIndex, 60), 0x43C9D80D);  // the transitions' lambda follows it
   EXPECT_EQ(with(kResultIndex, 2), 0x98F5D6F7);
   EXPECT_EQ(with(kRollingShutterRippleIndex, 2), 0xEB08BCD7);
-  SolverParamsRecord lambda_alone = RecordOf({});
+  SolverParamsRecord lambda_alone = RecordOf(ParameterValues());
   lambda_alone.smoothness_lambda = 240;
   EXPECT_EQ(SolveHash(lambda_alone), 0x911C9E8B);
+  // Each parameter of a solve at a number of its own: a field that reads another's shows.
+  ParameterValues numbered;
+  for (std::int32_t index = 59; index <= 83; ++index) numbered[index] = 100 + index;
+  numbered[kUseNewSolverIndex] = numbered[kConservativeFactorizationIndex] = 0;
+  EXPECT_EQ(SolveHash(RecordOf(numbered)), 0xEB984791);
+  EXPECT_EQ(CropHash(RecordOf(numbered)), 0x0B4446F8);
 }
 
 // Another value for a parameter, of its kind and in its range.
@@ -64,16 +63,16 @@ TEST(SolveHashTest, EachParameterChangesTheHashOfWhatItRules) {
   const std::set<std::int32_t> solve = {4,  5,  6,  18, 59, 60, 61, 62, 63, 64, 65, 66, 67,
                                         68, 69, 70, 71, 72, 73, 74, 75, 76, 77, 78, 79, 83};
   const std::set<std::int32_t> crop = {9, 11, 12, 19, 80, 81};
-  const SolverParamsRecord before = RecordOf({});
+  const SolverParamsRecord before = RecordOf(ParameterValues());
   for (std::int32_t index = 1; index < kParamCount; ++index) {
     SCOPED_TRACE(index);
-    ParameterValues values;
-    values[index] = Another(*ParameterTableRow(index));
+    ParameterValues values, hidden_values(false);
+    values[index] = hidden_values[index] = Another(*ParameterTableRow(index));
     const SolverParamsRecord after = RecordOf(values);
     EXPECT_EQ(SolveHash(after) != SolveHash(before), solve.count(index) == 1);
     EXPECT_EQ(CropHash(after) != CropHash(before), crop.count(index) == 1);
     if (!IsExperimentalIndex(index)) continue;
-    const SolverParamsRecord hidden = RecordOf(values, false);
+    const SolverParamsRecord hidden = RecordOf(hidden_values);
     EXPECT_EQ(SolveHash(hidden), SolveHash(before));
     EXPECT_EQ(CropHash(hidden), CropHash(before));
   }
@@ -90,7 +89,7 @@ TEST(SolveHashTest, MaximumScaleCountsWithAutoScaleAlone) {
 }
 
 TEST(SolveHashTest, PixelAspectCountsOnlyWhereItIsNotSquare) {
-  SolverParamsRecord params = RecordOf({});
+  SolverParamsRecord params = RecordOf(ParameterValues());
   params.pixel_aspect = 1.0f;
   const std::uint32_t square = SolveHash(params);
   std::set<std::uint32_t> hashes = {square};
@@ -104,7 +103,7 @@ TEST(SolveHashTest, PixelAspectCountsOnlyWhereItIsNotSquare) {
 
 // The frame's size is in the hashes by the limits that are found from it.
 TEST(SolveHashTest, FieldsThatDecideNothingAreLeftOut) {
-  SolverParamsRecord params = RecordOf({});
+  SolverParamsRecord params = RecordOf(ParameterValues());
   const std::uint32_t solve = SolveHash(params), crop = CropHash(params);
   params.reconstruction_error_threshold += 1;
   params.data_weight += 1;

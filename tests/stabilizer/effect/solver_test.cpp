@@ -11,6 +11,7 @@
 #include "platform/tessel/threads.h"
 #include "stabilizer/effect/src/parameter_rules.h"
 #include "synthetic/track_world.h"
+#include "tests/support/parameter_values.h"
 #include "tests/support/shaken_table.h"
 
 namespace {
@@ -23,10 +24,7 @@ constexpr std::uint32_t kWidth = 640;
 constexpr std::uint32_t kHeight = 360;
 
 SolverParamsRecord Params() {
-  kelp::effect::ClipGeometry clip;
-  clip.width = kWidth;
-  clip.height = kHeight;
-  return MakeSolverParams({}, clip);
+  return GetSolverParams(kelp::effect::ParameterValues(), {kWidth, kHeight}, 25);
 }
 
 std::unique_ptr<Solver> NewSolver(const AllFeatures& table, bool needs_cropper = true,

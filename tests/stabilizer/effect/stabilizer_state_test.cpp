@@ -4,11 +4,25 @@
 
 #include <boost/make_shared.hpp>
 
-#include "stabilizer/effect/src/table_reader.h"
-#include "tests/stabilizer/effect/stabilizer_host.h"
+#include "tests/support/parameter_values.h"
 
 namespace kelp::effect {
 namespace {
+
+// One frame that stays where it is.
+boost::shared_ptr<const marrow::stabilization::CPWarper> StandingWarper(std::int32_t width,
+                                                                        std::int32_t height) {
+  const auto warper = boost::make_shared<marrow::stabilization::CPWarper>(1, width, height);
+  const auto record =
+      boost::make_shared<marrow::stabilization::VarVector>(warper->gridCols(), warper->gridRows());
+  for (std::size_t i = 0; i < record->values.size(); i += 2) {
+    const auto vertex = static_cast<std::int32_t>(i / 2);
+    record->values[i] = vertex % record->cols * (width - 1.0) / (record->cols - 1);
+    record->values[i + 1] = vertex / record->cols * (height - 1.0) / (record->rows - 1);
+  }
+  warper->storeFrameWarp(record, true);
+  return warper;
+}
 
 boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height) {
   const auto crop = boost::make_shared<cropper>(1, 1920, 1080);
@@ -19,16 +33,19 @@ boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height)
 
 // A state of a 1920 x 1080 clip with that crop window.
 struct ZoomCase {
-  ZoomCase(std::int32_t width, std::int32_t height, const Controls& controls)
-      : values(ValuesOf(controls)) {
-    state.warper = ShiftingWarper(1920, 1080, {{0, 0}});
-    state.crop = Window(width, height);
+  ZoomCase(std::int32_t width, std::int32_t height, Framing framing) {
+    values[kFramingIndex] = static_cast<int>(framing);
+    analysis::Replace(state.solve_result, [&](SolveResult& next) {
+      next.warper = StandingWarper(1920, 1080);
+      next.crop = Window(width, height);
+    });
   }
   double Zoom(bool auto_scale, bool additional, float scale = 1) {
-    renderer = Renderer(state.warper->unionBounds(), 1920, 1080, 64, 36, scale, scale);
-    return state.GetZoom(TableReader(values, false), renderer, auto_scale, additional);
+    renderer =
+        Renderer(state.solve_result->warper->unionBounds(), 1920, 1080, 64, 36, scale, scale);
+    return state.GetZoom(values, renderer, auto_scale, additional);
   }
-  bool OverCropped() { return state.IsOverCropped(TableReader(values, false)); }
+  bool OverCropped() { return state.IsOverCropped(values); }
   void ExpectOut(int left, int top, int right, int bottom) const {
     EXPECT_EQ(renderer.outLeft, left);
     EXPECT_EQ(renderer.outTop, top);
@@ -36,64 +53,197 @@ struct ZoomCase {
     EXPECT_EQ(renderer.outBottom, bottom);
   }
 
-  const ParameterValues values;
+  ParameterValues values;
   StabilizerState state{HX_InData{}, false};
-  Renderer renderer{{0, 0, 1, 1}, 1, 1, 2, 2, 1, 1};
+  const marrow::stabilization::frame_bounds bounds{0, 0, 1, 1};
+  Renderer renderer{bounds, 1, 1, 2, 2, 1, 1};
 };
 
 TEST(StabilizerStateTest, ZoomAndOutputRectangle) {
-  ZoomCase whole(1920, 1080, {});
+  ZoomCase whole(1920, 1080, Framing::crop_auto_scale);
   EXPECT_NEAR(whole.Zoom(true, true), 1081.0 / 1080, 1e-6);  // the height wins
   whole.ExpectOut(0, 0, 1920, 1080);
 
-  ZoomCase half(960, 540, {});
+  ZoomCase half(960, 540, Framing::crop_auto_scale);
   EXPECT_EQ(half.Zoom(true, true), 1.5);  // Maximum Scale
   half.ExpectOut(240, 135, 1680, 945);
   EXPECT_EQ(half.Zoom(true, true, 0.5f), 1.5);
   half.ExpectOut(120, 68, 840, 473);
 
-  Controls small;
-  small.framing = Framing::crop;
-  small.additional_scale = 50;
-  ZoomCase smaller(1700, 1000, small);
+  ZoomCase smaller(1700, 1000, Framing::crop);
+  smaller.values[kAdditionalScaleIndex] = 50;
   EXPECT_EQ(smaller.Zoom(true, true), 0.5);
   smaller.ExpectOut(535, 290, 1385, 790);
   EXPECT_EQ(smaller.Zoom(true, false), 1.0);
   EXPECT_EQ(smaller.Zoom(false, true), 0.5);
 
-  ZoomCase none(0, 540, small);
+  ZoomCase none(0, 540, Framing::crop);
+  none.values[kAdditionalScaleIndex] = 50;
   EXPECT_EQ(none.Zoom(true, true), 0.5);
   none.ExpectOut(0, 0, 0, 0);
 }
 
 // At 1920 x 1080 the limits are 768 and 432, of the window as it is shown.
 TEST(StabilizerStateTest, OverCropped) {
-  Controls crop_only, stabilize_only;
-  crop_only.framing = Framing::crop;
-  stabilize_only.framing = Framing::stabilize_only;
-  EXPECT_FALSE(ZoomCase(768, 432, crop_only).OverCropped());
-  EXPECT_TRUE(ZoomCase(767, 432, crop_only).OverCropped());
-  EXPECT_TRUE(ZoomCase(1900, 431, crop_only).OverCropped());
-  EXPECT_FALSE(ZoomCase(767, 431, stabilize_only).OverCropped());
-  EXPECT_FALSE(ZoomCase(512, 288, {}).OverCropped());  // 1.5 times makes 768 x 432
-  EXPECT_TRUE(ZoomCase(511, 288, {}).OverCropped());
-  EXPECT_TRUE(ZoomCase(0, 0, {}).OverCropped());
+  const struct {
+    std::int32_t width, height;
+    Framing framing;
+    bool over_cropped;
+  } cases[] = {{768, 432, Framing::crop, false},
+               {767, 432, Framing::crop, true},
+               {1900, 431, Framing::crop, true},
+               {767, 431, Framing::stabilize_only, false},
+               {512, 288, Framing::crop_auto_scale, false},  // 1.5 times makes 768 x 432
+               {511, 288, Framing::crop_auto_scale, true},
+               {0, 0, Framing::crop_auto_scale, true}};
+  for (const auto& c : cases) {
+    EXPECT_EQ(ZoomCase(c.width, c.height, c.framing).OverCropped(), c.over_cropped)
+        << c.width << " x " << c.height;
+  }
 }
 
 TEST(StabilizerStateTest, MarginInFramesRoundsHalvesUp) {
-  Controls edges;
-  edges.framing = Framing::synthesize_edges;
-  ParameterValues values = ValuesOf(edges);
-  const TableReader params(values, false);
-  EXPECT_EQ(MarginInFrames(params, 30), 15u);
-  EXPECT_EQ(MarginInFrames(params, 25), 13u);
-  EXPECT_EQ(MarginInFrames(params, 30000.0 / 1001), 15u);
+  ParameterValues values;
+  values[kFramingIndex] = static_cast<int>(Framing::synthesize_edges);
+  EXPECT_EQ(MarginInFrames(values, 30), 15u);
+  EXPECT_EQ(MarginInFrames(values, 25), 13u);
+  EXPECT_EQ(MarginInFrames(values, 30000.0 / 1001), 15u);
   values[kSynthesisInputRangeIndex] = 0.01;
-  EXPECT_EQ(MarginInFrames(params, 30), 0u);
+  EXPECT_EQ(MarginInFrames(values, 30), 0u);
   values[kSynthesisInputRangeIndex] = 999;
-  EXPECT_EQ(MarginInFrames(params, 1e9), 2147483647u);
+  EXPECT_EQ(MarginInFrames(values, 1e9), 2147483647u);
   values[kFramingIndex] = static_cast<int>(Framing::crop);
-  EXPECT_EQ(MarginInFrames(params, 30), 0u);
+  EXPECT_EQ(MarginInFrames(values, 30), 0u);
+}
+
+// -- What a state shares with renders, and what a project keeps of it --
+
+using tessel::utility::Guid;
+
+bool operator==(const SourceShape& a, const SourceShape& b) {
+  return a.SameSize(b) && a.par_num == b.par_num && a.par_den == b.par_den;
+}
+
+// Makes it a solved state in which nothing is what a fresh state has.
+void Fill(StabilizerState& state, std::int32_t first_frame) {
+  state.source = {1440, 1080, 4, 3};
+  analysis::Replace(state.result, [&](analysis::AnalysisResult& next) {
+    next.job_input.FieldType = 2;
+    next.source_identity = Guid::MakeUnique();
+    next.tracker_identity = Guid::MakeUnique();
+    next.all_features = {};
+    next.all_features.feature_count = 1;
+    next.all_features.frame_count = 1;
+    next.all_features.first_frame = first_frame;
+    next.all_features.features->resize(1);
+  });
+  state.solve_result =
+      boost::make_shared<SolveResult>(SolveResult{StandingWarper(64, 36), Window(9, 9), 77, 78});
+  state.phase = SolvePhase::Solved;
+  analysis::AnalyzerRecord job;
+  job.tracker_guid = Guid::MakeUnique();
+  state.analyzer = boost::make_shared<analysis::AnalyzerPrem>(job, Guid(), analysis::JobFactory());
+  state.detailed = true;
+  state.progress.start_tick = 1234;
+}
+
+TEST(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
+  StabilizerSharedData block;
+  StabilizerState own({}, false), render({}, true);
+  Fill(own, 7);
+  own.shared = render.shared = &block;
+  render.TakeOver();
+  EXPECT_FALSE(render.has_frames()) << "nothing is published";
+  for (bool StabilizerState::*const flag :
+       {&StabilizerState::needs_solve, &StabilizerState::subsequent_solve,
+        static_cast<bool StabilizerState::*>(&StabilizerState::first_analysis)}) {
+    own.*flag = true;
+    own.Publish(false);
+    render.TakeOver();
+    EXPECT_TRUE(render.source == own.source);
+    EXPECT_EQ(render.result, own.result);
+    EXPECT_EQ(render.solve_result, own.solve_result);
+    EXPECT_EQ(render.analyzer, own.analyzer);
+    EXPECT_EQ(render.phase, SolvePhase::Solved);
+    EXPECT_EQ(render.needs_solve, own.needs_solve);
+    EXPECT_EQ(render.subsequent_solve, own.subsequent_solve);
+    EXPECT_EQ(render.first_analysis, own.first_analysis);
+    EXPECT_FALSE(block.contents.gpu_allowed);
+    own.*flag = false;
+  }
+  own.Publish(true);
+  EXPECT_TRUE(block.contents.gpu_allowed);
+}
+
+TEST(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
+  StabilizerSharedData block;
+  StabilizerState own({}, false), other({}, false);
+  Fill(own, 7);
+  Fill(other, 8);
+  own.shared = other.shared = &block;
+  other.Publish(false);
+  const auto analyzer = own.analyzer;
+  const auto cells = own.table().features;
+  own.TakeOver();
+  EXPECT_EQ(own.analyzer, analyzer);
+  EXPECT_EQ(own.table().features, cells);
+  EXPECT_EQ(own.table().first_frame, 7);
+  EXPECT_EQ(own.result->source_identity, other.result->source_identity);
+  EXPECT_EQ(own.result->tracker_identity, other.result->tracker_identity);
+  EXPECT_EQ(own.solve_result, other.solve_result);
+  EXPECT_EQ(other.table().first_frame, 8) << "what is published is never written";
+}
+
+TEST(StabilizerStateTest, WhatIsSavedIsLoaded) {
+  StabilizerState own({}, false);
+  Fill(own, 7);
+  for (const bool needs_solve : {true, false}) {
+    own.needs_solve = needs_solve;
+    SavedState saved = own.Save();
+    EXPECT_FALSE(saved.analysis_pending);
+    saved.analysis_pending = true;
+    StabilizerState loaded({}, false);
+    loaded.Load(saved, {});
+    EXPECT_TRUE(loaded.source == own.source);
+    EXPECT_EQ(loaded.result, own.result);
+    EXPECT_EQ(loaded.solve_result, own.solve_result);
+    EXPECT_EQ(loaded.phase, SolvePhase::Solved);
+    EXPECT_EQ(loaded.needs_solve, needs_solve);
+    EXPECT_EQ(loaded.progress.start_tick, 1234u);
+    EXPECT_TRUE(bool(loaded.detailed));
+    ASSERT_TRUE(loaded.analyzer);
+    EXPECT_EQ(loaded.analyzer->record().tracker_guid, own.analyzer->record().tracker_guid);
+    EXPECT_EQ(loaded.analyzer->GetSourceIdentity(), own.result->source_identity);
+    EXPECT_TRUE(loaded.analysis_pending);
+    EXPECT_FALSE(loaded.result_identity.IsNil());
+    EXPECT_EQ(loaded.solve_input_identity, loaded.result_identity);
+  }
+  own.analyzer.reset();
+  SavedState saved = own.Save();
+  saved.analysis_pending = true;
+  StabilizerState loaded({}, false);
+  loaded.Load(saved, {});
+  EXPECT_FALSE(loaded.analyzer);
+  EXPECT_FALSE(loaded.analysis_pending) << "frames would wait for nothing";
+}
+
+// What does not fit is left out, or told to be of no parameters.
+TEST(StabilizerStateTest, ResultsAreSavedAsFarAsTheyStand) {
+  StabilizerState own({}, false);
+  Fill(own, 7);
+  own.phase = SolvePhase::AnalysisFailed;
+  auto saved = own.Save().solve_result;
+  EXPECT_FALSE(saved->warper);
+  EXPECT_FALSE(saved->crop);
+  EXPECT_EQ(saved->solve_hash, 77);
+  EXPECT_EQ(saved->crop_hash, 78);
+  own.phase = SolvePhase::Solved;
+  own.deletion_identity = Guid::MakeUnique();  // of others than the table is marked with
+  saved = own.Save().solve_result;
+  EXPECT_EQ(saved->warper, own.solve_result->warper);
+  EXPECT_EQ(saved->solve_hash, std::int64_t{1} << 32);
+  EXPECT_EQ(saved->crop_hash, 78);
+  EXPECT_EQ(own.solve_result->solve_hash, 77);
 }
 
 }  // namespace

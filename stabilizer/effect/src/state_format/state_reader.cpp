@@ -6,7 +6,6 @@
 
 #include "platform/tessel/debug.h"
 #include "platform/tessel/serialization.h"
-#include "stabilizer/effect/src/parameter_rules.h"
 #include "stabilizer/effect/src/state_format/format.h"
 #include "stabilizer/effect/src/state_format/job_json.h"
 #include "stabilizer/effect/src/state_format/solve_sections.h"
@@ -28,7 +27,7 @@ constexpr std::size_t kLongestText = 1 << 16;
 
 class StateBinaryConverter {
  public:
-  StateBinaryConverter(InputByteStream& in, std::uint32_t version, const PresentSource& present)
+  StateBinaryConverter(InputByteStream& in, std::uint32_t version, const SourceShape& present)
       : in_(in), version_(version), present_(present) {}
 
   SavedState Read() {
@@ -39,16 +38,18 @@ class StateBinaryConverter {
       Expect(Marker::Crop);
       bool has_crop = false;
       in_ >> has_crop;
-      if (has_crop) state_.crop = ReadCrop(in_, frames());
+      if (has_crop) solve_.crop = ReadCrop(in_, frames());
     }
     Expect(Marker::Pup);
     SettleFlags();
+    state_.result = boost::make_shared<analysis::AnalysisResult>(std::move(result_));
+    state_.solve_result = boost::make_shared<SolveResult>(std::move(solve_));
     return std::move(state_);
   }
 
  private:
   bool Has(std::uint32_t since) const { return version_ >= since; }
-  std::int32_t frames() const { return state_.all_features.frame_count; }
+  std::int32_t frames() const { return result_.all_features.frame_count; }
 
   void Expect(Marker marker) {
     if (!Has(kMarkersAndSize)) return;
@@ -65,14 +66,15 @@ class StateBinaryConverter {
   }
 
   void ReadSourceSize() {
-    state_.source_width = present_.width;
-    state_.source_height = present_.height;
+    SourceShape& source = state_.source;
+    source.width = present_.width;
+    source.height = present_.height;
     if (!Has(kMarkersAndSize)) return;
-    in_ >> state_.source_width >> state_.source_height >> state_.par_num >> state_.par_den;
+    in_ >> source.width >> source.height >> source.par_num >> source.par_den;
   }
 
   void ReadCounts() {
-    auto& table = state_.all_features;
+    auto& table = result_.all_features;
     std::uint64_t slots = 0;
     in_ >> table.frame_count >> slots;
     constexpr auto kMost = std::uint64_t{std::numeric_limits<std::int32_t>::max()};
@@ -80,23 +82,23 @@ class StateBinaryConverter {
       throw StreamError("track table's counts are none");
     }
     table.feature_count = static_cast<std::int32_t>(slots);
-    if (frames() > 0 && (state_.source_width < 1 || state_.source_height < 1 ||
-                         state_.par_num < 1 || state_.par_den < 1)) {
+    const SourceShape& source = state_.source;
+    if (frames() > 0 &&
+        (source.width < 1 || source.height < 1 || source.par_num < 1 || source.par_den < 1)) {
       throw StreamError("source without a size");
     }
   }
 
   void CheckSourceSize() {
     if (present_.one_by_one()) return;
-    if (state_.source_width == present_.width && state_.source_height == present_.height) return;
+    if (state_.source.SameSize(present_)) return;
     if (frames() == 0) {  // nothing depends on it yet
-      state_.source_width = present_.width;
-      state_.source_height = present_.height;
+      state_.source.width = present_.width;
+      state_.source.height = present_.height;
       return;
     }
     StateRefused refused(StateRefused::Reason::SourceSize, "of a source of another size");
-    refused.stored_width = state_.source_width;
-    refused.stored_height = state_.source_height;
+    refused.stored = state_.source;
     throw refused;
   }
 
@@ -105,11 +107,11 @@ class StateBinaryConverter {
     ReadSourceSize();
     ReadCounts();
     CheckSourceSize();
-    state_.job_input = ParseJobInput(ReadText());
-    if (Has(kTrackerIdentity)) in_ >> state_.tracker_identity;
+    result_.job_input = ParseJobInput(ReadText());
+    if (Has(kTrackerIdentity)) in_ >> result_.tracker_identity;
     if (Has(kAnalysisTick)) in_ >> state_.analysis_tick;
     Expect(Marker::Guid);
-    if (Has(kSourceIdentity)) in_ >> state_.source_identity;
+    if (Has(kSourceIdentity)) in_ >> result_.source_identity;
     if (Has(kPendingFlag)) in_ >> state_.analysis_pending;
     if (Has(kNeedsSolveFlag)) in_ >> state_.needs_solve;
     if (Has(kDetailedFlag)) in_ >> state_.detailed;
@@ -121,7 +123,7 @@ class StateBinaryConverter {
   void ReadSolve() {
     Expect(Marker::Solv);
     std::int32_t phase = 0;
-    in_ >> phase >> state_.solve_hash >> state_.crop_hash;
+    in_ >> phase >> solve_.solve_hash >> solve_.crop_hash;
     state_.phase = static_cast<SolvePhase>(phase);
     switch (state_.phase) {
       case SolvePhase::None:
@@ -154,22 +156,11 @@ class StateBinaryConverter {
 
   // Of the frames in square pixels.
   boost::shared_ptr<CPWarper> MakeWarper() const {
-    ClipGeometry clip;
-    if (present_.one_by_one()) {
-      clip.width = static_cast<std::uint32_t>(state_.source_width);
-      clip.height = static_cast<std::uint32_t>(state_.source_height);
-      clip.pixel_aspect_num = state_.par_num;
-      clip.pixel_aspect_den = state_.par_den;
-    } else {
-      clip.width = static_cast<std::uint32_t>(std::max(present_.width, 1));
-      clip.height = static_cast<std::uint32_t>(std::max(present_.height, 1));
-      clip.pixel_aspect_num = present_.par_num;
-      clip.pixel_aspect_den = present_.par_den;
-    }
+    const SourceShape& source = present_.one_by_one() ? state_.source : present_;
     constexpr auto kWidest = std::uint32_t{std::numeric_limits<std::int32_t>::max()};
     return boost::make_shared<CPWarper>(
-        frames(), static_cast<std::int32_t>(std::min(clip.square_width(), kWidest)),
-        static_cast<std::int32_t>(clip.height));
+        frames(), static_cast<std::int32_t>(std::min(source.square_width(), kWidest)),
+        static_cast<std::int32_t>(source.square_height()));
   }
 
   void ReadResults() {
@@ -183,18 +174,18 @@ class StateBinaryConverter {
       PassMapMarker();
       warper->setFrameMap(ReadFrameMap(in_, frames()));
     }
-    state_.warper = warper;
+    solve_.warper = warper;
     if (!Has(kCropWindow)) {
       // Wraps around: nothing but a difference is wanted.
-      state_.crop_hash =
-          static_cast<std::int64_t>(static_cast<std::uint64_t>(state_.crop_hash) + 1);
+      solve_.crop_hash =
+          static_cast<std::int64_t>(static_cast<std::uint64_t>(solve_.crop_hash) + 1);
     }
   }
 
   void ReadTracks() {
     Expect(Marker::StrF);
-    in_ >> state_.all_features.first_frame;
-    ReadTrackTable(in_, Has(kFixedPointPositions), state_.all_features);
+    in_ >> result_.all_features.first_frame;
+    ReadTrackTable(in_, Has(kFixedPointPositions), result_.all_features);
   }
 
   void SettleFlags() {
@@ -209,14 +200,16 @@ class StateBinaryConverter {
 
   InputByteStream& in_;
   const std::uint32_t version_;
-  const PresentSource present_;
+  const SourceShape present_;
   SavedState state_;
+  analysis::AnalysisResult result_;
+  SolveResult solve_;
 };
 
 }  // namespace
 
 SavedState ReadState(const void* payload, std::size_t size, std::uint32_t version, bool raw,
-                     const PresentSource& present) try {
+                     const SourceShape& present) try {
   tessel::filesupport::IStringByteStream bytes(payload, size);
   if (raw && version >= kRawPayloads) {
     SavedState state = StateBinaryConverter(bytes, version, present).Read();

@@ -17,39 +17,43 @@ void Write(OutputByteStream& out, Marker marker) {
 }
 
 void WriteAnalysis(OutputByteStream& out, const SavedState& state) {
+  const SourceShape& source = state.source;
+  const analysis::AnalysisResult& result = *state.result;
   Write(out, Marker::Stab);
-  out << state.source_width << state.source_height << state.par_num << state.par_den;
-  out << state.all_features.frame_count
-      << static_cast<std::uint64_t>(state.all_features.feature_count);
-  out << JobInputText(state.job_input) << state.tracker_identity << state.analysis_tick;
+  out << source.width << source.height << source.par_num << source.par_den;
+  out << result.all_features.frame_count
+      << static_cast<std::uint64_t>(result.all_features.feature_count);
+  out << JobInputText(result.job_input) << result.tracker_identity << state.analysis_tick;
   Write(out, Marker::Guid);
-  out << state.source_identity << state.analysis_pending << state.needs_solve << state.detailed;
+  out << result.source_identity << state.analysis_pending << state.needs_solve << state.detailed;
   out << state.job.has_value();
   if (state.job) out << JobText(*state.job);
 }
 
 void WriteSolve(OutputByteStream& out, const SavedState& state) {
-  const bool without_results = state.phase == SolvePhase::Solved && !state.warper;
+  const SolveResult& solve = *state.solve_result;
+  const bool without_results = state.phase == SolvePhase::Solved && !solve.warper;
   const SolvePhase phase = without_results ? SolvePhase::None : state.phase;
   Write(out, Marker::Solv);
-  out << static_cast<std::int32_t>(phase) << state.solve_hash << state.crop_hash;
+  out << static_cast<std::int32_t>(phase) << solve.solve_hash << solve.crop_hash;
   Write(out, Marker::Mesh);
-  if (phase == SolvePhase::Solved) WriteWarps(out, *state.warper);
+  if (phase == SolvePhase::Solved) WriteWarps(out, *solve.warper);
   Write(out, Marker::MtoN);
-  WriteFrameMap(out, phase == SolvePhase::Solved ? state.warper->frameMap().get() : nullptr);
+  WriteFrameMap(out, phase == SolvePhase::Solved ? solve.warper->frameMap().get() : nullptr);
 }
 
 }  // namespace
 
 void WriteState(OutputByteStream& out, const SavedState& state) {
+  const auto& crop = state.solve_result->crop;
   WriteAnalysis(out, state);
   WriteSolve(out, state);
   Write(out, Marker::StrF);
-  out << state.all_features.first_frame;
-  WriteTrackTable(out, state.all_features);
+  out << state.result->all_features.first_frame;
+  WriteTrackTable(out, state.result->all_features);
   Write(out, Marker::Crop);
-  out << bool{state.crop};
-  if (state.crop) WriteCrop(out, *state.crop);
+  out << bool{crop};
+  if (crop) WriteCrop(out, *crop);
   Write(out, Marker::Pup);
 }
 

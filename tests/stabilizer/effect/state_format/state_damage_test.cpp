@@ -6,7 +6,7 @@
 #include "stabilizer/effect/src/state_format/state_reader.h"
 #include "stabilizer/effect/src/state_format/state_writer.h"
 #include "tests/stabilizer/effect/state_format/allocation_meter.h"
-#include "tests/stabilizer/effect/state_format/sample_payload.h"
+#include "tests/stabilizer/effect/state_format/samples.h"
 
 // Whatever has become of a payload: it is refused, or it loads; no more memory is taken than a
 // small multiple of it.
@@ -14,7 +14,7 @@
 namespace kelp::effect {
 namespace {
 
-constexpr PresentSource kPresent{64, 36, 1, 1};
+constexpr SourceShape kPresent{64, 36, 1, 1};
 // A record's buffer, a piece of the table, a stream's buffers.
 constexpr std::int64_t kScratch = 1 << 20;
 
@@ -29,11 +29,11 @@ bool Loads(const std::string& payload, std::uint32_t version, bool raw, std::siz
     const SavedState state = ReadState(payload.data(), payload.size(), version, raw, kPresent);
     loads = true;
     EXPECT_LE(meter.Peak(), kScratch + 6 * static_cast<std::int64_t>(expanded));
-    EXPECT_EQ(state.all_features.features->size(),
-              static_cast<std::size_t>(state.all_features.frame_count) *
-                  static_cast<std::size_t>(state.all_features.feature_count));
-    if (state.warper) {
-      EXPECT_EQ(static_cast<int>(state.warper->frameWarpCount()), state.all_features.frame_count);
+    const auto& table = state.result->all_features;
+    EXPECT_EQ(table.features->size(), static_cast<std::size_t>(table.frame_count) *
+                                          static_cast<std::size_t>(table.feature_count));
+    if (state.solve_result->warper) {
+      EXPECT_EQ(static_cast<int>(state.solve_result->warper->frameWarpCount()), table.frame_count);
     }
     tessel::filesupport::OStringByteStream out;
     WriteState(out, state);
@@ -45,10 +45,8 @@ bool Loads(const std::string& payload, std::uint32_t version, bool raw, std::siz
 }
 
 TEST(StateDamageTest, EveryTruncationIsRefused) {
-  for (const int phase : {2, 4}) {
-    Sample sample;
-    sample.phase = phase;
-    const std::string plain = SamplePayload(sample), deflated = Deflated(plain);
+  for (const char* const name : {"v16_solved", "v16_failed"}) {
+    const auto& [version, deflated, plain] = ReadSample(name);
     ASSERT_TRUE(Loads(plain, 16, true, plain.size()));
     for (std::size_t size = 0; size<plain.size(); size += size> 4000 ? 7 : 1) {
       ASSERT_FALSE(Loads(plain.substr(0, size), 16, true, size)) << size;
@@ -61,7 +59,7 @@ TEST(StateDamageTest, EveryTruncationIsRefused) {
 }
 
 TEST(StateDamageTest, EveryFlippedByteIsRefusedOrLoads) {
-  std::string plain = SamplePayload({});
+  auto [version, deflated, plain] = ReadSample("v16_solved");
   int loaded = 0, refused = 0;
   for (std::size_t i = 0; i < plain.size(); ++i) {
     // Within a record's offsets all bytes are alike.
@@ -76,7 +74,6 @@ TEST(StateDamageTest, EveryFlippedByteIsRefusedOrLoads) {
   EXPECT_GT(loaded, 1000);   // numbers
   EXPECT_GT(refused, 1000);  // what holds them together
   // A check value guards a deflated one.
-  std::string deflated = Deflated(plain);
   for (std::size_t i = 0; i < deflated.size(); ++i) {
     for (int bit = 0; bit < 8; ++bit) {
       deflated[i] ^= static_cast<char>(1 << bit);
@@ -89,12 +86,12 @@ TEST(StateDamageTest, EveryFlippedByteIsRefusedOrLoads) {
 }
 
 TEST(StateDamageTest, CountsBeyondTheDataTakeNoMemory) {
-  const std::string plain = SamplePayload({});
+  const std::string plain = ReadSample("v16_solved").plain;
   const auto with = [&plain](std::size_t offset, const std::string& bytes) {
     std::string changed = plain;
     return changed.replace(offset, bytes.size(), bytes);
   };
-  const auto frames = [](std::int32_t count) { return Bytes().I32(count).data(); };
+  const auto frames = [](std::int32_t count) { return BytesOf(count); };
   constexpr std::size_t kFrames = 20, kSlots = 24;
   for (const std::int32_t count : {-1, 0, 1, 3, 1 << 20, 0x7fffffff}) {
     EXPECT_FALSE(Loads(with(kFrames, frames(count)), 16, true, 0)) << count;
@@ -102,11 +99,11 @@ TEST(StateDamageTest, CountsBeyondTheDataTakeNoMemory) {
   }
   for (const std::uint64_t slots :
        {std::uint64_t{0}, std::uint64_t{1} << 31, std::uint64_t{1} << 62, ~std::uint64_t{0}}) {
-    EXPECT_FALSE(Loads(with(kSlots, Bytes().Put(slots).data()), 16, true, 0)) << slots;
+    EXPECT_FALSE(Loads(with(kSlots, BytesOf(slots)), 16, true, 0)) << slots;
   }
   // A table that would need more than any machine has, of zeros that deflate to little.
-  EXPECT_FALSE(Loads(Deflated(with(kSlots, Bytes().Put(std::uint64_t{0x7fffffff}).data())), 16,
-                     false, plain.size()));
+  EXPECT_FALSE(
+      Loads(Deflated(with(kSlots, BytesOf(std::uint64_t{0x7fffffff}))), 16, false, plain.size()));
   const std::size_t map = plain.find("NotM"), crop = plain.find("porC");
   for (const std::size_t offset : {map + 4, map + 8, crop + 5, crop + 9}) {
     for (const std::int32_t count : {-1, 0x7fffffff}) {
@@ -117,7 +114,7 @@ TEST(StateDamageTest, CountsBeyondTheDataTakeNoMemory) {
   }
   // Keys of the map: frames of the clip, two different ones, each pair once.
   for (const auto& [m, n] : {std::pair{0, 0}, {0, 2}, {-1, 0}, {1, 0}}) {
-    EXPECT_FALSE(Loads(with(map + 12, Bytes().I32(m).I32(n).data()), 16, true, plain.size()));
+    EXPECT_FALSE(Loads(with(map + 12, BytesOf(m) + BytesOf(n)), 16, true, plain.size()));
   }
   EXPECT_FALSE(Loads(with(crop + 5, frames(1)), 16, true, 0)) << "a crop of another clip";
 }
@@ -128,12 +125,11 @@ TEST(StateDamageTest, RandomMutationsOfEveryVersion) {
   const auto below = [&random](std::size_t n) { return random() % n; };
   int refused = 0;
   for (std::uint32_t version = 3; version <= 16; ++version) {
+    const std::string samples[] = {ReadSample(version, "solved").plain,
+                                   ReadSample(version, "failed").plain,
+                                   ReadSample(version, "unsolved").plain};
     for (int round = 0; round < 120; ++round) {
-      Sample sample;
-      sample.version = version;
-      sample.phase = round % 3 == 0 ? 2 : round % 3 == 1 ? 4 : 0;
-      sample.has_job = round % 2 == 0;
-      std::string plain = SamplePayload(sample);
+      std::string plain = samples[round % 3];
       for (std::size_t change = 0; change <= below(4); ++change) {
         const std::size_t at =
             below(below(2) ? plain.size() : std::min<std::size_t>(900, plain.size()));
@@ -148,7 +144,7 @@ TEST(StateDamageTest, RandomMutationsOfEveryVersion) {
             plain.insert(at, 1 + below(9), static_cast<char>(random()));
             break;
           case 3:
-            plain.replace(at, 4, Bytes().I32(below(2) ? 0x7fffffff : -1).data());
+            plain.replace(at, 4, BytesOf(below(2) ? 0x7fffffff : -1));
             break;
           default:
             plain.resize(at + 1);
