@@ -1,104 +1,282 @@
-#include <gtest/gtest.h>
+// What goes wrong: plug-ins that misbehave, and operations that fail under the real one.
 
 #include <set>
+#include <stdexcept>
 #include <string>
+#include <vector>
 
-#include "host/base/operations.h"
-#include "host/effects/session.h"
-#include "tests/host/effects/drawn_clip.h"
-#include "tests/host/effects/probe.h"
+#include "platform/hx/hx_suites.h"
+#include "tests/host/effects/probe_test.h"
 
 namespace calmframe::host {
 namespace {
 
-using namespace std::chrono_literals;
-using namespace probe;
-
-const std::set<HX_Err> kCodes = {HX_ERR_NONE,   HX_ERR_UNKNOWN,       HX_ERR_HANDLE_LOCK,
-                                 HX_ERR_MEMORY, HX_ERR_MISSING_SUITE, HX_ERR_NO_INSTANCE,
-                                 kFaultCode};
-
-// A little of everything; codes that came, in order.
-std::vector<HX_Err> Tour(Host& host) {
-  std::vector<HX_Err> codes;
-  Session session(host);
-  Effect& effect = session.Apply(MakeDrawnLayer());
-  codes.push_back(effect.creation().code);
-  codes.push_back(effect.Press(kStart).code);
-  codes.push_back(effect.SetParam(kAmount, 7).code);
-  for (int i = 0; i < kTicks; ++i) codes.push_back(effect.Tick().code);
-  SavedEffect saved;
-  codes.push_back(effect.Save(&saved).code);
-  const auto renderer = effect.MakeRenderer();
-  codes.push_back(renderer->result().code);
-  codes.push_back(renderer->Direct({1}).result.code);
-  codes.push_back(renderer->Planned({1}).result.code);
-  return codes;
-}
-
-class FaultsTest : public testing::Test {
+class FaultsTest : public ProbeTest {
  protected:
-  ~FaultsTest() override { Operations::Get().FailNone(); }
+  // An effect on a layer, and a frame by each path.
+  void Play() {
+    Effect& effect = session->Apply(MakeDrawnLayer());
+    const auto renderer = effect.MakeRenderer();
+    direct = renderer->Direct({3}).result;
+    planned = renderer->Planned({3}).result;
+  }
+  CommandResult direct, planned;
 };
 
-TEST_F(FaultsTest, WhicheverOperationFailsNothingIsLostAndTheNextTourIsWhole) {
-  Host host(PROBE_PLUGIN);
-  host.handles().MoveOnUnlock(true);
-  std::uint64_t operations = Operations::Get().count();
-  const std::vector<HX_Err> whole = Tour(host);
-  operations = Operations::Get().count() - operations;
-  for (const HX_Err code : whole) EXPECT_EQ(code, 0);
-  ASSERT_GT(operations, 80u);
+void Lose(const HX_Callbacks& cb, int locks) {
+  const HX_Handle handle = cb.new_handle(8);
+  while (locks-- > 0) cb.lock_handle(handle);
+}
+HX_Err WholeFrame(const probe::Call& call) {
+  auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
+  plan.full_rect = plan.result_rect = plan.request.rect;
+  HX_CheckoutResult result;
+  return plan.checkout_layer(call.in->effect_ref, 0, 7, &plan.request, call.in->current_time,
+                             call.in->time_step, call.in->time_scale, &result);
+}
+HX_Err FrameOfTheLayer(const probe::Call& call) {
+  call.out->width = kClipWidth;
+  call.out->height = kClipHeight;
+  return HX_ERR_NONE;
+}
 
-  std::uint64_t seen = 0;
-  for (std::uint64_t n = 1; n <= operations; ++n) {
-    Operations::Get().FailNth(static_cast<std::int64_t>(n));
-    bool failed = false;
-    for (const HX_Err code : Tour(host)) {
-      EXPECT_TRUE(kCodes.count(code)) << n << ": " << code;
-      failed = failed || code != 0;
-    }
-    seen += failed ? 1 : 0;
-    Operations::Get().FailNone();
-    ASSERT_EQ(Ledger::Get().Report(), "") << n;
-    ASSERT_EQ(host.instances().size(), 0u) << n;
-    ASSERT_EQ(host.opaque_data().uses(), 0u) << n;
-    ASSERT_EQ(host.handles().count(), 1u) << n;  // the plug-in's global data
+TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
+  static const char* const kTexts[] = {"$$$/A=B", nullptr};
+  static const HX_StringTable kTable = {2, 7, kTexts};
+  const struct {
+    const char* told;
+    std::uint32_t command;
+    std::function<void(const Call&)> deed;
+  } misdeeds[] = {
+      {"1 of handle left\n", HX_CMD_CREATE_INSTANCE, [](const Call& call) { Lose(call.cb(), 0); }},
+      {"1 of handle left\n2 of handle lock left\n", HX_CMD_STOP_PLUGIN,
+       [](const Call& call) { Lose(call.cb(), 2); }},
+      {"1 of handle left\nDestroyInstance: the handle is still there\n", HX_CMD_CREATE_INSTANCE,
+       [](const Call& call) { call.out->instance_handle = call.cb().new_handle(8); }},
+      {"1 of world left\n", HX_CMD_RENDER_FRAME,
+       [](const Call& call) {
+         HX_World world;
+         Suite<HX_WorldSuite2> worlds(call, HX_WORLD_SUITE, 2);
+         worlds->NewWorld(call.in->effect_ref, 3, 2, 1, HX_FORMAT_ARGB16, &world);
+       }},
+      {"1 of opaque data use left\n", HX_CMD_CREATE_INSTANCE,
+       [](const Call& call) {
+         void* winner = nullptr;
+         Suite<HX_OpaqueEffectDataSuite1> opaque(call, HX_OPAQUE_EFFECT_DATA_SUITE, 1);
+         opaque->Set(7, &winner, &winner);
+       }},
+      {"1 of parameter checkout left\ncheckout_param: a frame was not checked in\n",
+       HX_CMD_RENDER_FRAME,
+       [](const Call& call) {
+         HX_ParamDef input;
+         call.cb().checkout_param(call.in->effect_ref, 0, 0, 1, 25, &input);
+       }},
+      {"-1 of parameter checkout left\ncheckin_param: a frame that is not checked out\n",
+       HX_CMD_RENDER_FRAME,
+       [](const Call& call) { call.cb().checkin_param(call.in->effect_ref, call.params[0]); }},
+      {"1 of direct render left\n", HX_CMD_RENDER_FRAME,
+       [](const Call& call) {
+         call.cb().utility(call.in->effect_ref, HX_UTILITY_BEGIN_RENDER, kTexts);
+       }},
+      {"1 of string table left\n", HX_CMD_START_PLUGIN,
+       [](const Call& call) {
+         std::uint64_t token = 0;
+         call.cb().open_strings(nullptr, 7, &kTable, &token);
+         EXPECT_STREQ(call.cb().get_string(token, 0, 0, 0), "B");
+         EXPECT_EQ(call.cb().get_string(token, 1, 0, 0), nullptr);
+       }},
+      {"close_strings: not open\n", HX_CMD_STOP_PLUGIN,
+       [](const Call& call) { call.cb().close_strings(99); }},
+      {"1 of segments left\n", HX_CMD_CREATE_INSTANCE,
+       [](const Call& call) {
+         HX_Segments segments = 0;
+         Suite<HX_SequenceInfoSuite> sequence(call, HX_SEQUENCE_INFO_SUITE, 3);
+         EXPECT_EQ(sequence->AcquireSegments(call.in->effect_ref, &segments), HX_ERR_NONE);
+       }},
+      {"1 of suite HX World Suite left\n", HX_CMD_CREATE_INSTANCE,
+       [](const Call& call) {
+         const void* table = nullptr;
+         EXPECT_EQ(call.in->basic->acquire("HX World Suite", 3, &table), HX_ERR_MISSING_SUITE);
+         EXPECT_EQ(call.in->basic->acquire("HX World Suite", 2, &table), HX_ERR_NONE);
+       }},
+      {"HX World Suite: given back but not held\n", HX_CMD_CREATE_INSTANCE,
+       [](const Call& call) { call.in->basic->release("HX World Suite", 2); }},
+      {"entry: an exception came out\n", HX_CMD_CREATE_INSTANCE,
+       [](const Call&) { throw std::runtime_error("not caught"); }},
+      {"plan.checkout_layer: one id for two times\n", HX_CMD_PLAN_FRAME,
+       [](const Call& call) {
+         call.in->current_time += call.in->time_step;
+         EXPECT_EQ(WholeFrame(call), HX_ERR_UNKNOWN);
+       }},
+      {"render.checkout_layer_pixels: a frame was not checked in\n", HX_CMD_RENDER_PLANNED_FRAME,
+       [](const Call& call) {
+         HX_World* world = nullptr;
+         const auto& render = *static_cast<HX_RenderExtra*>(call.extra);
+         EXPECT_EQ(render.checkout_layer_pixels(call.in->effect_ref, 7, &world), HX_ERR_NONE);
+         EXPECT_NE(render.checkout_layer_pixels(call.in->effect_ref, 8, &world), HX_ERR_NONE);
+       }},
+      {"render.checkin_layer_pixels: a frame that is not checked out\n",
+       HX_CMD_RENDER_PLANNED_FRAME,
+       [](const Call& call) {
+         static_cast<HX_RenderExtra*>(call.extra)->checkin_layer_pixels(call.in->effect_ref, 7);
+       }},
+      {"output: written behind its rows\n", HX_CMD_RENDER_FRAME,
+       [](const Call& call) {
+         static_cast<std::uint8_t*>(call.output->data)[4 * call.output->width] = 0;
+       }},
+  };
+  for (const auto& misdeed : misdeeds) {
+    SCOPED_TRACE(misdeed.told);
+    on = {{HX_CMD_PREPARE_FRAME, FrameOfTheLayer}, {HX_CMD_PLAN_FRAME, WholeFrame}};
+    on[misdeed.command] = [&, usual = on[misdeed.command]](const Call& call) -> HX_Err {
+      const HX_Err code = usual ? usual(call) : HX_ERR_NONE;
+      misdeed.deed(call);
+      return code;
+    };
+    Start();
+    Play();
+    EXPECT_EQ(LeftBehind(), misdeed.told);
   }
-  // What fails while the effect is taken apart, or within a refresh of no answer, shows no code.
-  EXPECT_GT(seen, operations / 2);
-  EXPECT_EQ(Tour(host), whole);
-  host.Stop();
-  EXPECT_EQ(host.LeakReport(), "");
+}
+
+TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
+  const auto refuse = [](const Call&) { return 77; };
+  const auto say = [](const Call& call) {
+    call.out->out_flags |= HX_OUT_FLAG_SHOW_MESSAGE;
+    call.cb().copy_text(call.out->return_msg, HX_RETURN_MSG_SIZE, "No room.");
+    return HX_ERR_MEMORY;
+  };
+  const auto grow = [](const Call& call) {
+    call.out->width = (1 << 17) + 1;
+    call.out->height = 1;
+    return HX_ERR_NONE;
+  };
+  const auto exceed = [](const Call& call) {
+    auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
+    plan.result_rect = {-(1 << 30), 0, 1 << 30, 1};
+    plan.may_exceed = 1;
+    return HX_ERR_NONE;
+  };
+  const struct {
+    Deed prepare, plan;
+    std::string line;
+  } cases[] = {{refuse, refuse, "it: the plug-in answered 77"},
+               {say, say, "it: No room."},
+               {grow, exceed, "it: the plug-in answered " + std::to_string(HX_ERR_UNKNOWN)}};
+  for (const auto& c : cases) {
+    on = {{HX_CMD_PREPARE_FRAME, c.prepare}, {HX_CMD_PLAN_FRAME, c.plan}};
+    Start();
+    Play();
+    EXPECT_EQ(direct.Line("it"), c.line);
+    EXPECT_EQ(planned.Line("it"), c.line);
+    EXPECT_EQ(LeftBehind(), "");
+  }
 }
 
 TEST_F(FaultsTest, AStartThatFailsIsToldAndLeavesNothing) {
+  const auto refusal = [this](std::uint32_t command, const Deed& deed) {
+    on = {{command, deed}};
+    try {
+      Start();
+    } catch (const PluginError& error) {
+      EXPECT_EQ(Host::active(), nullptr);
+      return std::string(error.what());
+    }
+    return std::string("none");
+  };
+  const std::string file = PROBE_PLUGIN ": ";
+  EXPECT_EQ(refusal(HX_CMD_START_PLUGIN, [](const Call&) { return 77; }),
+            file + "the plug-in answered 77");
+  EXPECT_EQ(refusal(HX_CMD_DECLARE_PARAMS, [](const Call&) { return 78; }),
+            file + "the plug-in answered 78");
+  const auto miscount = [](const Call& call) -> HX_Err {
+    call.out->num_params = 3;
+    return HX_ERR_NONE;
+  };
+  EXPECT_EQ(refusal(HX_CMD_DECLARE_PARAMS, miscount),
+            file + "tells of 3 parameters and declares 1");
   for (const char* operation : {"open_strings", "new_handle", "lock_handle", "add_param"}) {
     Operations::Get().FailAlways(operation);
-    try {
-      Host host(PROBE_PLUGIN);
-      ADD_FAILURE() << operation;
-    } catch (const PluginError& error) {
-      EXPECT_NE(std::string(error.what()).find(PROBE_PLUGIN ": "), std::string::npos);
-    }
+    EXPECT_THROW(Host(CALMFRAME_PLUGIN), PluginError) << operation;
     EXPECT_EQ(Host::active(), nullptr);
     EXPECT_EQ(Ledger::Get().Report(), "") << operation;
     Operations::Get().FailNone();
   }
-  Host host(PROBE_PLUGIN);
+  on.clear();
+  Start();
   EXPECT_THROW(Host second(PROBE_PLUGIN), std::logic_error);
 }
 
-TEST_F(FaultsTest, AMissingSuiteIsRefusedByName) {
-  Host host(PROBE_PLUGIN);
+// A little of everything that the real plug-in does on its own thread; codes that came, in order.
+std::vector<HX_Err> Tour(Host& host) {
+  static const std::set<HX_Err> kTold = {HX_ERR_NONE,          kFaultCode,
+                                         HX_ERR_MEMORY,        HX_ERR_HANDLE_LOCK,
+                                         HX_ERR_MISSING_SUITE, HX_ERR_NO_INSTANCE};
+  std::vector<HX_Err> codes;
+  const auto keep = [&](const CommandResult& result) {
+    EXPECT_TRUE(kTold.count(result.code) || !result.message.empty()) << result.code;
+    codes.push_back(result.code);
+  };
+  SourceInfo pixel;  // nothing to analyse, so that no other thread has a part in it
+  pixel.width = pixel.height = 1;
+  pixel.frame_count = 3;
   Session session(host);
-  Operations::Get().FailAlways("acquire " HX_OPAQUE_EFFECT_DATA_SUITE);
-  Effect& effect = session.Apply(MakeDrawnLayer());
-  EXPECT_EQ(effect.creation().code, HX_ERR_MISSING_SUITE);
-  Operations::Get().FailNone();
-  EXPECT_TRUE(effect.Press(kStart).ok());  // makes the instance that could not be had
-  EXPECT_EQ(session.TickUntilSettled(1h), Session::Wait::settled);
-  EXPECT_EQ(Session::StatusOf(effect), 8);
+  Effect& effect = session.Apply(boost::make_shared<Layer>(
+      MakeDrawnSource(pixel, [](std::int64_t, Picture& picture) { picture.memory()[0] = 255; })));
+  keep(effect.creation());
+  keep(effect.Press(1));
+  keep(effect.SetParam(5, 7));
+  keep(effect.Tick());
+  SavedEffect saved;
+  keep(effect.Save(&saved));
+  const auto renderer = effect.MakeRenderer();
+  keep(renderer->result());
+  keep(renderer->Direct({1}).result);
+  keep(renderer->Planned({1}).result);
+  return codes;
+}
+
+TEST_F(FaultsTest, WhicheverOperationFailsNothingIsLostAndTheNextTourIsWhole) {
+  Host real(CALMFRAME_PLUGIN);
+  real.handles().MoveOnUnlock(true);
+  std::uint64_t operations = Operations::Get().count();
+  const std::vector<HX_Err> whole = Tour(real);
+  operations = Operations::Get().count() - operations;
+  for (const HX_Err code : whole) EXPECT_EQ(code, 0);
+  ASSERT_GT(operations, 80u);
+  std::uint64_t seen = 0;
+  for (std::uint64_t n = 1; n <= operations; ++n) {
+    Operations::Get().FailNth(static_cast<std::int64_t>(n));
+    seen += Tour(real) != whole;
+    Operations::Get().FailNone();
+    ASSERT_EQ(Ledger::Get().Report(), "") << n;
+    ASSERT_EQ(real.instances().size(), 0u) << n;
+    ASSERT_EQ(real.opaque_data().uses(), 0u) << n;
+    ASSERT_EQ(real.handles().count(), 1u) << n;  // the plug-in's global data
+  }
+  EXPECT_GT(seen, 20u);  // what fails while the effect is taken apart shows no code
+  EXPECT_EQ(Tour(real), whole);
+  EXPECT_TRUE(real.Stop().ok());
+  EXPECT_EQ(real.LeakReport(), "");
+}
+
+TEST_F(FaultsTest, TextsAreCutBetweenCharacters) {
+  on[HX_CMD_IDLE_TICK] = [](const Call& call) -> HX_Err {
+    std::uint16_t name[6] = {7, 7, 7, 7, 7, 7};
+    const std::uint16_t film[] = {u'a', 0xD83C, 0xDFA5, 0};
+    char bytes[5] = {};
+    Suite<HX_UtilitySuite> utility(call, HX_UTILITY_SUITE, 5);
+    EXPECT_EQ(utility->GetLayerName(call.in->effect_ref, name, 5), HX_ERR_NONE);
+    EXPECT_EQ(std::vector(name, name + 6), (std::vector<std::uint16_t>{'a', 'b', 'c', 0, 7, 7}));
+    Suite<HX_PrivateEffectSuite3> own(call, HX_PRIVATE_EFFECT_SUITE, 3);
+    EXPECT_EQ(own->ConvertText(film, bytes, 5), HX_ERR_NONE);
+    EXPECT_STREQ(bytes, "a");
+    return 33;
+  };
+  Start();
+  const auto layer = MakeDrawnLayer();
+  layer->Change([](LayerState& state) { state.name = "abc\xF0\x9F\x8E\xA5"; });
+  EXPECT_EQ(session->Apply(layer).Tick().code, 33) << "as it ran";
 }
 
 }  // namespace

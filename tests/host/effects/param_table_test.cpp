@@ -25,18 +25,15 @@ std::vector<HX_ParamDef> Declared() {
 
 TEST(ParamTableTest, TheUsersValuesAreClamped) {
   ParamTable table(Declared());
-  const auto set = [&](int index, double value) {
-    EXPECT_TRUE(table.SetByUser(index, value));
-    return *ValueOf(*table.At(index));
-  };
-  EXPECT_EQ(set(1, 1e9), 1000);
-  EXPECT_EQ(set(1, -1e9), -1);
-  EXPECT_EQ(set(1, 0.125), 0.125);
-  EXPECT_EQ(set(2, 0), 1);
-  EXPECT_EQ(set(2, 7), 4);
-  EXPECT_EQ(set(2, 2.6), 3);
-  EXPECT_EQ(set(3, 17), 1);
-  EXPECT_EQ(set(3, 0), 0);
+  const struct {
+    int index;
+    double value, taken;
+  } cases[] = {{1, 1e9, 1000}, {1, -1e9, -1}, {2, 0, 1}, {2, 7, 4},
+               {2, 2.6, 3},    {3, 17, 1},    {3, 0, 0}, {1, 0.125, 0.125}};
+  for (const auto& c : cases) {
+    EXPECT_TRUE(table.SetByUser(c.index, c.value));
+    EXPECT_EQ(*ValueOf(*table.At(c.index)), c.taken);
+  }
   EXPECT_FALSE(table.SetByUser(1, std::nan("")));
   for (const int index : {-1, 0, 4, 6}) EXPECT_FALSE(table.SetByUser(index, 1));
   EXPECT_EQ(*ValueOf(*table.At(1)), 0.125);

@@ -1,22 +1,24 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 
-// What the probe plug-in and its tests both know.
+#include "platform/hx/hx.h"
+
+// A plug-in whose entry does what a test tells it.
 namespace probe {
 
-// Indices of its parameters; disk ids lie 100 above, but for the status.
-enum : std::int32_t { kStart = 1, kStop, kAmount, kMode, kSwitch, kStatus, kParams };
-
-// kMode: how a frame is drawn.
-enum : std::int32_t {
-  kPlain = 1,
-  kGrown = 2,       // by kMargin on each side
-  kNeighbours = 3,  // the frame before and the frame behind, averaged; planned renders alone
+struct Call {
+  std::uint32_t command;
+  HX_InData* in;
+  HX_OutData* out;
+  HX_ParamDef** params;
+  HX_World* output;
+  void* extra;
+  const HX_Callbacks& cb() const { return *in->cb; }
 };
-inline constexpr std::int32_t kMargin = 4;
 
-// Ticks that its work takes after it was started.
-inline constexpr std::int32_t kTicks = 6;
+// Where it is null the entry succeeds and does nothing. Set while nobody calls it.
+__attribute__((visibility("default"))) std::function<HX_Err(const Call&)>& Behaviour();
 
 }  // namespace probe

@@ -1,158 +1,221 @@
 #include "host/effects/renderer.h"
 
-#include <gtest/gtest.h>
-
+#include <atomic>
 #include <cmath>
 #include <thread>
 #include <vector>
 
-#include "host/base/operations.h"
-#include "host/effects/session.h"
-#include "tests/host/effects/drawn_clip.h"
-#include "tests/host/effects/probe.h"
+#include "host/pixels/world_operations.h"
+#include "tests/host/effects/probe_test.h"
 
 namespace calmframe::host {
 namespace {
 
-using namespace probe;
+using Rgb = std::vector<int>;
+const Rgb kClear = {-1, -1, -1};
 
-// Red, green and blue of a pixel in 255ths; -1 where it is clear.
-std::vector<int> At(const WorldBuffer& buffer, int x, int y) {
-  const double full = buffer.world().format == HX_FORMAT_ARGB16  ? 32768
-                      : buffer.world().format == HX_FORMAT_ARGBF ? 1
-                                                                 : 255;
-  std::vector<double> channels;
-  for (int c = 0; c < 4; ++c) {
-    channels.push_back(full == 255   ? buffer.row<std::uint8_t>(y)[x * 4 + c]
-                       : full == 1.0 ? buffer.row<float>(y)[x * 4 + c]
-                                     : buffer.row<std::uint16_t>(y)[x * 4 + c]);
-  }
-  if (channels[0] == 0) return {-1, -1, -1};
-  EXPECT_EQ(channels[0], full);
-  std::vector<int> rgb;
-  for (int c = 1; c < 4; ++c) {
-    rgb.push_back(static_cast<int>(std::lround(channels[c] / full * 255)));
+// In 255ths.
+Rgb At(const WorldBuffer& buffer, int x, int y) {
+  WorldBuffer one(1, 1, HX_FORMAT_ARGBF);
+  const HX_Rect place = {x, y, x + 1, y + 1};
+  EXPECT_EQ(CopyWorld(buffer.world(), one.world(), &place, nullptr), 0);
+  const HX_PixelFloat& pixel = *one.row<HX_PixelFloat>(0);
+  if (pixel.alpha == 0) return kClear;
+  EXPECT_EQ(pixel.alpha, 1);
+  Rgb rgb;
+  for (const float channel : {pixel.red, pixel.green, pixel.blue}) {
+    rgb.push_back(static_cast<int>(std::lround(channel * 255)));
   }
   return rgb;
 }
 
-class RendererTest : public testing::Test {
+// An effect that shows its input, or another frame, in the middle of an output that may be larger.
+class RendererTest : public ProbeTest {
  protected:
-  RendererTest() : host_(PROBE_PLUGIN), session_(host_), effect_(session_.Apply(MakeDrawnLayer())) {
-    host_.worlds().SetRowPadding(8);
+  RendererTest() {
+    on[HX_CMD_PREPARE_FRAME] = [this](const Call& call) -> HX_Err {
+      call.out->width = call.params[0]->u.ld.width + 2 * margin;
+      call.out->height = call.params[0]->u.ld.height + 2 * margin;
+      call.out->origin_x = call.out->origin_y = margin;
+      return HX_ERR_NONE;
+    };
+    on[HX_CMD_RENDER_FRAME] = [this](const Call& call) -> HX_Err {
+      if (offset == 0) return Draw(call, call.params[0]->u.ld, call.output);
+      HX_ParamDef input{};
+      const HX_InData& in = *call.in;
+      const std::int32_t time = in.current_time + offset * in.time_step;
+      if (const HX_Err code = call.cb().checkout_param(in.effect_ref, 0, time, in.time_step,
+                                                       in.time_scale, &input)) {
+        return code;
+      }
+      const HX_Err code = Draw(call, input.u.ld, call.output);
+      call.cb().checkin_param(in.effect_ref, &input);
+      return code;
+    };
+    on[HX_CMD_PLAN_FRAME] = [this](const Call& call) -> HX_Err {
+      auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
+      const HX_InData& in = *call.in;
+      HX_CheckoutResult results[3];
+      // Twice each: the second order widens the first.
+      for (const HX_Rect& wanted : {HX_Rect{1, 1, 2, 2}, HX_Rect{0, 0, 1 << 15, 1 << 15}}) {
+        for (const int id : {-1, 0, 1}) {
+          const HX_RenderRequest request{wanted, plan.request.bit_depth};
+          const std::int32_t time = in.current_time + id * in.time_step;
+          if (const HX_Err code =
+                  plan.checkout_layer(in.effect_ref, 0, id, &request, time, in.time_step,
+                                      in.time_scale, &results[1 + id])) {
+            return code;
+          }
+        }
+      }
+      const HX_Rect& rect = results[1].full_rect;
+      plan.full_rect = {rect.left - margin, rect.top - margin, rect.right + margin,
+                        rect.bottom + margin};
+      plan.result_rect = plan.full_rect;
+      plan.may_exceed = margin > 0;
+      return HX_ERR_NONE;
+    };
+    on[HX_CMD_RENDER_PLANNED_FRAME] = [this](const Call& call) -> HX_Err {
+      const auto& render = *static_cast<HX_RenderExtra*>(call.extra);
+      HX_World *output = nullptr, *input = nullptr;
+      render.checkout_output(call.in->effect_ref, &output);
+      if (const HX_Err code = render.checkout_layer_pixels(call.in->effect_ref, offset, &input)) {
+        return code;
+      }
+      const HX_Err code = Draw(call, *input, output);
+      render.checkin_layer_pixels(call.in->effect_ref, offset);
+      return code;
+    };
+    Start();
+    effect = &session->Apply(MakeDrawnLayer());
+    renderer = effect->MakeRenderer();
   }
   void TearDown() override {
-    session_.Remove(effect_);
-    host_.Stop();
-    EXPECT_EQ(host_.LeakReport(), "");
+    renderer.reset();
+    ProbeTest::TearDown();
   }
 
-  Host host_;
-  Session session_;
-  Effect& effect_;
+  // Layer (0, 0) of `from` lies at its origin; so it does in `to`.
+  static HX_Err Draw(const Call& call, const HX_World& from, HX_World* to) {
+    const std::int32_t x = from.origin_x - to->origin_x, y = from.origin_y - to->origin_y;
+    const HX_Rect place = {x, y, x + from.width, y + from.height};
+    return call.cb().copy_world(call.in->effect_ref, &from, to, nullptr, &place);
+  }
+  RenderedFrame Render(bool direct, const RenderRequest& request) {
+    return direct ? renderer->Direct(request) : renderer->Planned(request);
+  }
+
+  std::atomic<int> margin = 0, offset = 0;  // pixels on each side; frames
+  Effect* effect = nullptr;
+  std::unique_ptr<Renderer> renderer;
 };
 
 TEST_F(RendererTest, BothPathsDrawTheFrameAtEachDepth) {
-  const auto renderer = effect_.MakeRenderer();
   ASSERT_TRUE(renderer->result().ok());
-  for (const int depth : {8, 16, 32}) {
-    const RenderRequest request{3, depth};
-    const RenderedFrame planned = renderer->Planned(request);
-    ASSERT_TRUE(planned.pixels) << depth;
-    EXPECT_EQ(planned.pixels->world().width, kClipWidth);
-    EXPECT_EQ(planned.pixels->world().row_bytes, kClipWidth * depth / 2 + 8);
-    EXPECT_EQ(At(*planned.pixels, 32, 19), (std::vector<int>{60, 32, 19}));
-    EXPECT_EQ(effect_.shared()->PolygonOf(3), (std::vector<float>{0, 0, 33, 20}));
-    const RenderedFrame direct = renderer->Direct(request);
-    if (depth == 32) {
-      EXPECT_FALSE(direct.result.ok());
-    } else {
-      ASSERT_TRUE(direct.pixels) << direct.full_rect.right << " " << direct.layer_width << " "
-                                 << direct.full_rect.bottom;
-      EXPECT_EQ(At(*direct.pixels, 32, 19), (std::vector<int>{60, 32, 19}));
+  for (const bool direct : {true, false}) {
+    for (const int depth : {8, 16, 32}) {
+      const RenderedFrame frame = Render(direct, {3, depth});
+      if (direct && depth == 32) {
+        EXPECT_FALSE(frame.result.ok());
+        continue;
+      }
+      ASSERT_TRUE(frame.pixels) << direct << depth;
+      EXPECT_EQ(At(*frame.pixels, 32, 19), (Rgb{60, 32, 19}));
+      EXPECT_EQ(frame.pixels->world().format, FormatOfDepth(depth));
+      // The frames beside it, and none past either end.
+      for (const int beside : {-1, 1}) {
+        offset = beside;
+        EXPECT_EQ(At(*Render(direct, {5, depth}).pixels, 7, 8), (Rgb{100 + 20 * beside, 7, 8}));
+        EXPECT_EQ(Render(direct, {beside < 0 ? 0 : kClipFrames - 1}).result.code, HX_ERR_UNKNOWN);
+      }
+      offset = 0;
     }
+    EXPECT_FALSE(Render(direct, {0, 24}).result.ok());
+    EXPECT_FALSE(Render(direct, {0, 8, {2, 1}}).result.ok());
   }
-  EXPECT_FALSE(renderer->Planned({0, 24}).result.ok());
 }
 
 TEST_F(RendererTest, AGrownOutputLiesAroundTheLayer) {
-  effect_.SetParam(kMode, kGrown);
-  const auto renderer = effect_.MakeRenderer();
+  margin = 4;
   for (const bool direct : {true, false}) {
-    const RenderRequest request{2};
-    const RenderedFrame grown = direct ? renderer->Direct(request) : renderer->Planned(request);
+    const RenderedFrame grown = Render(direct, {2});
     ASSERT_TRUE(grown.pixels);
-    EXPECT_EQ(grown.full_rect.left, -kMargin);
-    EXPECT_EQ(grown.full_rect.bottom, kClipHeight + kMargin);
-    EXPECT_EQ(grown.pixels->world().origin_y, -kMargin);
-    EXPECT_EQ(At(*grown.pixels, 0, 0), (std::vector<int>{-1, -1, -1}));
-    EXPECT_EQ(At(*grown.pixels, kMargin + 5, kMargin + 6), (std::vector<int>{40, 5, 6}));
+    EXPECT_EQ(grown.full_rect.left, -4);
+    EXPECT_EQ(grown.full_rect.bottom, kClipHeight + 4);
+    EXPECT_EQ(grown.pixels->world().origin_y, -4);
+    EXPECT_EQ(At(*grown.pixels, 0, 0), kClear);
+    EXPECT_EQ(At(*grown.pixels, 9, 10), (Rgb{40, 5, 6}));
     const auto frame = grown.OnLayer();
     EXPECT_EQ(frame->world().width, kClipWidth);
-    EXPECT_EQ(At(*frame, 5, 6), (std::vector<int>{40, 5, 6}));
+    EXPECT_EQ(At(*frame, 5, 6), (Rgb{40, 5, 6}));
   }
 }
 
 TEST_F(RendererTest, APartComesAtItsPlace) {
-  const auto renderer = effect_.MakeRenderer();
   RenderRequest request{4};
-  request.part = HX_Rect{10, -3, 14, 2};
   for (const bool direct : {true, false}) {
-    const RenderedFrame part = direct ? renderer->Direct(request) : renderer->Planned(request);
+    request.part = HX_Rect{10, -3, 14, 2};
+    const RenderedFrame part = Render(direct, request);
     ASSERT_TRUE(part.pixels);
     EXPECT_EQ(part.pixels->world().origin_x, 10);
     EXPECT_EQ(part.pixels->world().origin_y, 0);
     EXPECT_EQ(part.pixels->world().width, 4);
     EXPECT_EQ(part.pixels->world().height, 2);
-    EXPECT_EQ(At(*part.pixels, 3, 1), (std::vector<int>{80, 13, 1}));
+    EXPECT_EQ(At(*part.pixels, 3, 1), (Rgb{80, 13, 1}));
     EXPECT_EQ(part.full_rect.right, kClipWidth);
+    request.part = HX_Rect{50, 0, 60, 10};
+    EXPECT_TRUE(Render(direct, request).result.ok());
+    EXPECT_FALSE(Render(direct, request).pixels);
   }
-  request.part = HX_Rect{50, 0, 60, 10};
-  EXPECT_TRUE(renderer->Planned(request).result.ok());
-  EXPECT_FALSE(renderer->Planned(request).pixels);
 }
 
 TEST_F(RendererTest, HalfResolutionAveragesAndRoundsUp) {
-  const auto renderer = effect_.MakeRenderer();
-  RenderRequest request{1, 16, {1, 2}};
   for (const bool direct : {true, false}) {
-    const RenderedFrame half = direct ? renderer->Direct(request) : renderer->Planned(request);
+    const RenderedFrame half = Render(direct, {1, 16, {1, 2}});
     ASSERT_TRUE(half.pixels);
     EXPECT_EQ(half.pixels->world().width, 17);
     EXPECT_EQ(half.pixels->world().height, 10);
-    // Rows 8 and 9, and about columns 2 and 3, of a 255th each.
+    // Rows 8 and 9, of a 255th each.
     EXPECT_NEAR(half.pixels->row<HX_Pixel16>(4)[1].blue, 8.5 / 255 * 32768, 2);
     EXPECT_EQ(half.layer_width, 17);
   }
 }
 
-TEST_F(RendererTest, FramesBesideAndPastTheEnd) {
-  effect_.SetParam(kMode, kNeighbours);
-  const auto renderer = effect_.MakeRenderer();
-  EXPECT_EQ(At(*renderer->Planned({5}).pixels, 7, 7), (std::vector<int>{100, 7, 7}));
-  // The neighbour isn't there: its order succeeds, its pixels are an error.
-  EXPECT_EQ(renderer->Planned({kClipFrames - 1}).result.code, HX_ERR_UNKNOWN);
-  EXPECT_EQ(renderer->Planned({0}).result.code, HX_ERR_UNKNOWN);
-  effect_.SetParam(kMode, kPlain);
+TEST_F(RendererTest, PastItsMediaALayerIsClearAndItBeginsWhereItIsTold) {
   const RenderedFrame past = renderer->Planned({kClipFrames});
   EXPECT_TRUE(past.result.ok());
   EXPECT_FALSE(past.pixels);
-  EXPECT_EQ(At(*past.OnLayer(), 3, 3), (std::vector<int>{-1, -1, -1}));
-  EXPECT_EQ(At(*renderer->Direct({kClipFrames}).pixels, 3, 3), (std::vector<int>{-1, -1, -1}));
-  // The layer begins later in the media.
-  effect_.shared()->layer()->Change([](LayerState& layer) { layer.start_frame = 6; });
-  EXPECT_EQ(At(*renderer->Planned({1}).pixels, 0, 1), (std::vector<int>{140, 0, 1}));
+  EXPECT_EQ(At(*past.OnLayer(), 3, 3), kClear);
+  EXPECT_EQ(At(*renderer->Direct({kClipFrames}).pixels, 3, 3), kClear);
+  effect->shared()->layer()->Change([](LayerState& layer) { layer.start_frame = 6; });
+  for (const bool direct : {true, false}) {
+    EXPECT_EQ(At(*Render(direct, {1}).pixels, 0, 1), (Rgb{140, 0, 1}));
+  }
+}
+
+// An interlaced layer's second field stands half a frame later.
+TEST_F(RendererTest, EachFieldIsRenderedAtItsTime) {
+  effect->shared()->layer()->Change(
+      [](LayerState& layer) { layer.field_type = HX_FIELD_FIRST_ORDER; });
+  for (const bool direct : {true, false}) {
+    for (const bool second : {false, true}) {
+      RenderRequest request{3};
+      request.second_field = second;
+      // Lines 0 2 4 ..., or 1 3 5 ... with the nearest of them above.
+      EXPECT_EQ(At(*Render(direct, request).pixels, 5, 0), (Rgb{60, 5, second ? 1 : 0}));
+    }
+  }
 }
 
 TEST_F(RendererTest, RenderersWorkAtOnceWhileTheEffectTicksAndSaves) {
-  std::vector<std::thread> threads;
+  std::vector<std::jthread> threads;
   for (int t = 0; t < 3; ++t) {
     threads.emplace_back([this, t] {
-      const auto renderer = effect_.MakeRenderer();
+      const auto own = effect->MakeRenderer();
       for (int i = 0; i < 40; ++i) {
         const int frame = (i + t) % kClipFrames;
         const RenderedFrame rendered =
-            i % 2 ? renderer->Direct({frame}) : renderer->Planned({frame, 8, {1, 2}});
+            i % 2 ? own->Direct({frame}) : own->Planned({frame, 8, {1, 2}});
         EXPECT_TRUE(rendered.pixels);
         EXPECT_EQ(At(*rendered.OnLayer(), 2, 2)[0], frame * 20);
       }
@@ -160,12 +223,9 @@ TEST_F(RendererTest, RenderersWorkAtOnceWhileTheEffectTicksAndSaves) {
   }
   SavedEffect saved;
   for (int i = 0; i < 40; ++i) {
-    effect_.Press(kStart);
-    effect_.SetParam(kMode, i % 2 ? kPlain : kGrown);
-    session_.Tick();
-    EXPECT_TRUE(effect_.Save(&saved).ok());
+    session->Tick();
+    EXPECT_TRUE(effect->Save(&saved).ok());
   }
-  for (std::thread& thread : threads) thread.join();
 }
 
 }  // namespace

@@ -1,132 +1,174 @@
 #include "host/effects/session.h"
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 
+#include <cstring>
+#include <deque>
 #include <thread>
+#include <utility>
+#include <vector>
 
-#include "host/base/operations.h"
-#include "tests/host/effects/drawn_clip.h"
-#include "tests/host/effects/probe.h"
+#include "tests/host/effects/probe_test.h"
 
 namespace calmframe::host {
 namespace {
 
 using namespace std::chrono_literals;
-using namespace probe;
+using testing::ElementsAre;
+using testing::IsEmpty;
 
-// What the plug-in holds when all effects are gone and it was stopped.
-std::string LeaksAfter(Host& host) {
-  EXPECT_TRUE(host.Stop().ok());
-  return host.LeakReport();
-}
+enum : std::int32_t { kButton = 1, kAmount, kStatus };
+constexpr std::int32_t kAmountDiskId = 20;
 
-TEST(SessionTest, WorkRunsInTicksAndWritesItsControls) {
-  Host host(PROBE_PLUGIN);
-  host.handles().MoveOnUnlock(true);
-  EXPECT_EQ(host.version(), 0x10000u);
-  EXPECT_EQ(host.About().message, "A probe.");
-  ASSERT_EQ(host.declarations().size(), static_cast<std::size_t>(kParams));
-  EXPECT_STREQ(host.declarations()[kAmount].name, "Probe");  // localised, key and comment off
-  {
-    Session session(host);
-    Effect& effect = session.Apply(MakeDrawnLayer());
-    ASSERT_TRUE(effect.creation().ok());
-    EXPECT_EQ(host.opaque_data().uses(), 2u);  // the standing renderer's too
-    EXPECT_EQ(session.TickUntilSettled(1h), Session::Wait::settled);
-    EXPECT_EQ(Session::StatusOf(effect), 0);
-
-    EXPECT_FALSE(effect.Press(kStop).ok());  // disabled
-    const std::uint64_t generation = effect.shared()->generation();
-    ASSERT_TRUE(effect.Press(kStart).ok());
-    EXPECT_EQ(Session::WorkOf(effect), Session::Work::analysing);
-    EXPECT_GT(effect.shared()->generation(), generation);
-    EXPECT_STREQ(effect.Param(kStop)->name, "working");
-    int rounds = 0;
-    EXPECT_EQ(session.TickUntilSettled(1h, [&] { return ++rounds == 4; }), Session::Wait::stopped);
-    EXPECT_EQ(Session::WorkOf(effect), Session::Work::solving);
-    EXPECT_EQ(session.TickUntilSettled(1h), Session::Wait::settled);
-    EXPECT_EQ(Session::StatusOf(effect), 8);
-    EXPECT_EQ(*ValueOf(*effect.Param(kStatus)), 308);
-    EXPECT_TRUE(effect.Param(kStop)->ui_flags & HX_PARAM_UI_DISABLED);
+// An effect with an instance of two bytes, of which the second tells whether it is flattened, and
+// with statuses that its ticks show one after the other.
+class SessionTest : public ProbeTest {
+ protected:
+  SessionTest() {
+    on[HX_CMD_DECLARE_PARAMS] = [](const Call& call) -> HX_Err {
+      HX_ParamDef button{0, HX_PARAM_BUTTON, "Start", HX_PARAM_FLAG_SUPERVISED, 0, 0, {}};
+      HX_ParamDef amount{kAmountDiskId, HX_PARAM_FLOAT_SLIDER, "Amount", 0x40, 0, 0, {}};
+      amount.u.fs = {5, 0, 10, 0, 1, 5, 0.05f, 0, 0};
+      HX_ParamDef status{Session::kStatusDiskId, HX_PARAM_FLOAT_SLIDER, "", 0, 512, 0, {}};
+      status.u.fs = {0, 0, 2e9f, 0, 2000, 0, 0.05f, 0, 0};
+      for (const HX_ParamDef& param : {button, amount, status}) {
+        EXPECT_EQ(call.cb().add_param(nullptr, -1, &param), HX_ERR_NONE);
+      }
+      call.out->num_params = 4;
+      return HX_ERR_NONE;
+    };
+    on[HX_CMD_CREATE_INSTANCE] = [](const Call& call) { return NewInstance(call, 0); };
+    on[HX_CMD_FLATTEN_INSTANCE] = [](const Call& call) { return NewInstance(call, 1); };
+    on[HX_CMD_RESTORE_INSTANCE] = [](const Call& call) -> HX_Err {
+      if (const HX_Handle old = call.in->instance_handle) {
+        const auto* bytes = static_cast<const std::uint8_t*>(call.cb().lock_handle(old));
+        const bool whole = call.cb().handle_size(old) == 2 && bytes[1] == 1;
+        call.cb().unlock_handle(old);
+        if (!whole) return 77;
+      }
+      return NewInstance(call, 0);
+    };
+    on[HX_CMD_DESTROY_INSTANCE] = [](const Call& call) -> HX_Err {
+      if (call.in->instance_handle) call.cb().dispose_handle(call.in->instance_handle);
+      call.out->instance_handle = nullptr;
+      return HX_ERR_NONE;
+    };
+    on[HX_CMD_IDLE_TICK] = [this](const Call& call) -> HX_Err {
+      if (statuses.empty()) return HX_ERR_NONE;
+      call.params[kStatus]->u.fs.value = std::exchange(statuses[0], 0);
+      call.params[kStatus]->change_flag = 1;
+      statuses.pop_front();
+      return HX_ERR_NONE;
+    };
+    Start();
   }
-  EXPECT_EQ(LeaksAfter(host), "");
+
+  static HX_Err NewInstance(const Call& call, std::uint8_t flat) {
+    const HX_Handle handle = call.cb().new_handle(2);
+    static_cast<std::uint8_t*>(call.cb().lock_handle(handle))[1] = flat;
+    call.cb().unlock_handle(handle);
+    if (call.in->instance_handle) call.cb().dispose_handle(call.in->instance_handle);
+    call.in->instance_handle = call.out->instance_handle = handle;
+    return HX_ERR_NONE;
+  }
+
+  std::deque<double> statuses;
+};
+
+TEST_F(SessionTest, WorkRunsInTicksUntilItSettles) {
+  Effect& effect = session->Apply(MakeDrawnLayer());
+  ASSERT_TRUE(effect.creation().ok());
+  EXPECT_EQ(session->TickUntilSettled(1h), Session::Wait::settled);
+  EXPECT_EQ(Session::StatusOf(effect), 0);
+  statuses = {104, 204, 305, 407, 508};
+  const std::uint64_t generation = effect.shared()->generation();
+  session->Tick();
+  EXPECT_EQ(Session::WorkOf(effect), Session::Work::analysing);
+  EXPECT_GT(effect.shared()->generation(), generation);
+  EXPECT_EQ(session->TickUntilSettled(1h, [&] { return Session::StatusOf(effect) == 5; }),
+            Session::Wait::stopped);
+  EXPECT_EQ(Session::WorkOf(effect), Session::Work::solving);
+  EXPECT_EQ(session->TickUntilSettled(1h), Session::Wait::settled);
+  EXPECT_EQ(*ValueOf(*effect.Param(kStatus)), 508);
+  statuses = {604};
+  session->Tick();
+  EXPECT_EQ(session->TickUntilSettled(0ms), Session::Wait::timed_out);
 }
 
-TEST(SessionTest, AMessageIsShownOnce) {
-  Host host(PROBE_PLUGIN);
-  Session session(host);
-  Effect& effect = session.Apply(MakeDrawnLayer());
-  effect.Press(kStart);
-  EXPECT_EQ(effect.Press(kStop).message, "");  // of the refresh behind it
-  EXPECT_EQ(effect.TakeMessages(), std::vector<std::string>{"Stopped"});
-  EXPECT_TRUE(effect.TakeMessages().empty());
+TEST_F(SessionTest, ControlsTellTheEffectAndMessagesAreShownOnce) {
+  std::vector<std::pair<std::uint32_t, std::int32_t>> heard;
+  on[HX_CMD_PARAM_CHANGED] = [&](const Call& call) -> HX_Err {
+    heard.emplace_back(call.command, static_cast<HX_ParamChangedExtra*>(call.extra)->param_index);
+    call.cb().copy_text(call.out->return_msg, HX_RETURN_MSG_SIZE, "Heard");
+    call.out->out_flags |= HX_OUT_FLAG_SHOW_MESSAGE;
+    return HX_ERR_NONE;
+  };
+  on[HX_CMD_REFRESH_PARAMS] = [&](const Call& call) -> HX_Err {
+    heard.emplace_back(call.command, 0);
+    HX_ParamDef button = *call.params[kButton];
+    button.ui_flags = HX_PARAM_UI_DISABLED;
+    Suite<HX_ParamUtilsSuite3> utils(call, HX_PARAM_UTILS_SUITE, 3);
+    return utils->UpdateParamUI(call.in->effect_ref, kButton, &button);
+  };
+  Effect& effect = session->Apply(MakeDrawnLayer());
+  heard.clear();
+  const std::string before = effect.shared()->layer()->state()->effects[0].parameters;
   EXPECT_TRUE(effect.SetParam(kAmount, 99).ok());
-  EXPECT_EQ(host.user_interface().info(),
-            std::make_pair(std::string("Amount"), std::string("100%")));
-  EXPECT_FALSE(effect.SetParam(kStart, 1).ok());
+  EXPECT_EQ(*ValueOf(*effect.Param(kAmount)), 10);
+  EXPECT_NE(effect.shared()->layer()->state()->effects[0].parameters, before);
+  EXPECT_THAT(heard, ElementsAre(std::pair(HX_CMD_PARAM_CHANGED, kAmount),
+                                 std::pair(HX_CMD_REFRESH_PARAMS, 0)));
+  EXPECT_THAT(effect.TakeMessages(), ElementsAre("Heard"));
+  EXPECT_THAT(effect.TakeMessages(), IsEmpty());
+  heard.clear();
+  EXPECT_FALSE(effect.SetParam(kButton, 1).ok());
   EXPECT_FALSE(effect.Press(kAmount).ok());
+  EXPECT_FALSE(effect.Press(kButton).ok()) << "it was disabled";
+  EXPECT_THAT(heard, IsEmpty());
 }
 
-TEST(SessionTest, SavesLoadsAndDuplicatesWhileWorking) {
-  Host host(PROBE_PLUGIN);
-  host.handles().MoveOnUnlock(true);
-  {
-    Session session(host);
-    const auto layer = MakeDrawnLayer();
-    Effect& effect = session.Apply(layer);
-    effect.SetParam(kMode, kGrown);
-    effect.Press(kStart);
-    session.Tick();
-    SavedEffect saved;
-    ASSERT_TRUE(effect.Save(&saved).ok());
-    EXPECT_EQ(saved.match_name, "Probe");
-    EXPECT_EQ(saved.values.at(100 + kMode), kGrown);
-    ASSERT_FALSE(saved.instance.empty());
-    Effect* copy = session.Duplicate(effect, layer);
-    ASSERT_TRUE(copy);
-    EXPECT_NE(copy->shared()->reference(), effect.shared()->reference());
-    EXPECT_NE(copy->shared()->runtime_id(), effect.shared()->runtime_id());
-    const auto chain = layer->state()->effects;
-    ASSERT_EQ(chain.size(), 2u);
-    EXPECT_EQ(chain[0].runtime_id, effect.shared()->runtime_id());
-    EXPECT_EQ(chain[0].parameters, chain[1].parameters);
-    EXPECT_EQ(session.TickUntilSettled(1h), Session::Wait::settled);
-    EXPECT_EQ(Session::StatusOf(*copy), 8);
-    session.Remove(effect);
-    EXPECT_EQ(layer->state()->effects.size(), 1u);
+TEST_F(SessionTest, SavesLoadsAndDuplicates) {
+  const auto layer = MakeDrawnLayer();
+  Effect& effect = session->Apply(layer);
+  effect.SetParam(kAmount, 7);
+  SavedEffect saved;
+  ASSERT_TRUE(effect.Save(&saved).ok());
+  EXPECT_TRUE(effect.Tick().ok());
+  EXPECT_EQ(saved.match_name, "Probe");
+  EXPECT_EQ(saved.values.at(kAmountDiskId), 7);
+  EXPECT_THAT(saved.instance, ElementsAre(0, 1));
+  Effect* copy = session->Duplicate(effect, layer);
+  ASSERT_TRUE(copy);
+  EXPECT_NE(copy->shared()->reference(), effect.shared()->reference());
+  const auto chain = layer->state()->effects;
+  ASSERT_EQ(chain.size(), 2u);
+  EXPECT_EQ(chain[0].runtime_id, effect.shared()->runtime_id());
+  EXPECT_NE(chain[1].runtime_id, chain[0].runtime_id);
+  EXPECT_EQ(chain[0].parameters, chain[1].parameters);
+  session->Remove(effect);
+  EXPECT_EQ(layer->state()->effects.size(), 1u);
 
-    Effect& loaded = session.Load(MakeDrawnLayer(), saved);
-    ASSERT_TRUE(loaded.creation().ok());
-    EXPECT_EQ(session.TickUntilSettled(1h), Session::Wait::settled);
-    EXPECT_EQ(Session::StatusOf(loaded), 8);
-    SavedEffect damaged = saved;
-    damaged.instance.pop_back();
-    Effect& broken = session.Load(MakeDrawnLayer(), damaged);
-    EXPECT_EQ(broken.creation().code, 77);
-    EXPECT_EQ(broken.Tick().code, 77);  // tried again, not run on a flattened handle
-    damaged.match_name = "Other";
-    EXPECT_FALSE(session.Load(MakeDrawnLayer(), damaged).creation().ok());
-  }
-  EXPECT_EQ(LeaksAfter(host), "");
+  Effect& loaded = session->Load(MakeDrawnLayer(), saved);
+  EXPECT_TRUE(loaded.creation().ok());
+  EXPECT_EQ(*ValueOf(*loaded.Param(kAmount)), 7);
+  saved.instance.pop_back();
+  Effect& broken = session->Load(MakeDrawnLayer(), saved);
+  EXPECT_EQ(broken.creation().code, 77);
+  EXPECT_EQ(broken.Tick().code, 77) << "tried again, not run on a flattened handle";
+  saved.match_name = "Other";
+  EXPECT_FALSE(session->Load(MakeDrawnLayer(), saved).creation().ok());
 }
 
-TEST(SessionTest, OtherThreadsPostAndWake) {
-  Host host(PROBE_PLUGIN);
-  Session session(host);
-  Effect& effect = session.Apply(MakeDrawnLayer());
+TEST_F(SessionTest, OtherThreadsPostAndWake) {
   bool ran = false;
-  std::thread other([&] {
-    EXPECT_THROW(session.Tick(), std::logic_error);
-    session.Post([&] {
-      ran = true;
-      effect.Press(kStart);
-    });
-  });
-  other.join();
-  EXPECT_TRUE(host.WaitForWake(0ms));
-  EXPECT_EQ(session.TickUntilSettled(1h), Session::Wait::settled);
+  std::jthread([&] {
+    EXPECT_THROW(session->Tick(), std::logic_error);
+    session->Post([&] { ran = true; });
+  }).join();
+  EXPECT_TRUE(host->WaitForWake(0ms));
+  EXPECT_FALSE(host->WaitForWake(0ms));
+  session->Tick();
   EXPECT_TRUE(ran);
-  EXPECT_EQ(Session::StatusOf(effect), 8);
 }
 
 }  // namespace

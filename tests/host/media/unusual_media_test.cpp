@@ -27,12 +27,13 @@ class UnusualMediaTest : public ClipTest {
   }
 
   // Frames, times and pixels against those of the ffmpeg program.
-  void ExpectAsDecoded(const std::string& name) {
+  void ExpectAsDecoded(const std::string& name, std::size_t frames) {
     const auto reader = ClipReader::Open(In(name));
     const ClipInfo& info = reader->info();
     EXPECT_EQ(info.warning, "");
     const std::vector<double> times = TimesOf(In(name));
-    ASSERT_EQ(info.frame_count, times.size());
+    ASSERT_EQ(info.frame_count, frames);
+    ASSERT_EQ(times.size(), frames);
     const double tick = static_cast<double>(info.time_base.num) / info.time_base.den;
     for (std::size_t i = 0; i < times.size(); ++i) {
       EXPECT_NEAR(static_cast<double>(info.times[i].pts) * tick, times[i], 1e-5) << i;
@@ -121,14 +122,13 @@ TEST_F(UnusualMediaTest, FramesTimesAndPixelsAreTheFilesOwn) {
        source + "-frames:v 3 -vf scale=out_color_matrix=bt2020 -colorspace bt2020nc "
                 "-c:v ffv1 -pix_fmt yuv444p12le -strict -2",
        3},
-      {"8k.mov", "-f lavfi -i testsrc2=s=7680x4320:r=1 -frames:v 3 -c:v mjpeg -q:v 9", 3},
+      {"8k.mov", "-f lavfi -i testsrc2=s=7680x4320:r=1 -frames:v 1 -c:v mjpeg -q:v 9", 1},
   };
   Ffmpeg("-f lavfi -i color=red:s=32x32 -frames:v 1 " + In("cover.png"));
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
     Output("cd '" + In("") + "' && ffmpeg -nostdin -y -v error " + c.make + " " + c.name);
-    ExpectAsDecoded(c.name);
-    EXPECT_EQ(ClipReader::Open(In(c.name))->info().frame_count, c.frames);
+    ExpectAsDecoded(c.name, c.frames);
     std::filesystem::remove(In(c.name));
   }
 }

@@ -51,140 +51,75 @@ void Put(WorldBuffer& buffer, int x, int y, const Colour& colour) {
   }
 }
 
-// Alphas of 0 and 1 among others.
-void Fill(WorldBuffer& buffer, unsigned seed) {
+// Longer and shorter runs of clear, opaque and other pixels; `wild`: floats beyond any picture's.
+void Fill(WorldBuffer& buffer, unsigned seed, bool wild = false) {
   std::mt19937 random(seed);
   std::uniform_real_distribution<double> value(0, 1);
-  for (int y = 0; y < buffer.world().height; ++y) {
-    for (int x = 0; x < buffer.world().width; ++x) {
-      const double alpha = std::clamp(value(random) * 2 - 0.5, 0.0, 1.0);
-      Put(buffer, x, y, {alpha, value(random), value(random), value(random)});
-    }
-  }
-}
-
-Colour InFront(const Colour& s, const Colour& d) {
-  const double a = s[0] + d[0] * (1 - s[0]);
-  if (a == 0) return {};
-  Colour result{a};
-  for (int c = 1; c < 4; ++c) result[c] = (s[c] * s[0] + d[c] * d[0] * (1 - s[0])) / a;
-  return result;
-}
-
-TEST(Transfer, ComposesAllFormatsClippedAsTheFormulaTells) {
-  for (const std::uint32_t from_format : kFormats) {
-    for (const std::uint32_t to_format : kFormats) {
-      for (const int mode : {HX_TRANSFER_BEHIND, HX_TRANSFER_IN_FRONT}) {
-        WorldBuffer from(7, 6, from_format, 12), to(9, 5, to_format, 8), before(9, 5, to_format);
-        Fill(from, 1);
-        Fill(to, 2);
-        Fill(before, 2);
-        // Half opaque in front, told in the word that the target's depth reads.
-        const bool half = mode == HX_TRANSFER_IN_FRONT;
-        const double opacity = half ? 0.5 : 1.0;
-        const HX_TransferMode record = {mode, 0, static_cast<std::uint8_t>(half ? 0 : 255), 0,
-                                        static_cast<std::uint16_t>(half ? 16384 : 32768)};
-        const bool deep = to_format == HX_FORMAT_ARGB16 || to_format == HX_FORMAT_ARGBF;
-        HX_TransferMode used = record;
-        if (half && !deep) used.opacity = 51, used.opacity_u16 = 1;  // a fifth
-        const double factor = half && !deep ? 0.2 : opacity;
-        ASSERT_EQ(Transfer(from.world(), used, -2, 1, to.world()), 0);
-        const double step = deep ? 1e-4 : 0.5 / 255 + 1e-6;
-        for (int y = 0; y < 5; ++y) {
-          for (int x = 0; x < 9; ++x) {
-            Colour expected = Get(before, x, y);
-            const bool inside = x < 5 && y >= 1;
-            if (inside) {
-              Colour s = Get(from, x + 2, y - 1);
-              s[0] *= factor;
-              expected = half ? InFront(s, expected) : InFront(expected, s);
-            }
-            const Colour found = Get(to, x, y);
-            for (int c = 0; c < 4; ++c) {
-              ASSERT_NEAR(found[c], expected[c], inside ? step : 0)
-                  << mode << " " << x << " " << y << " " << c;
-            }
-          }
-        }
-        EXPECT_TRUE(to.PaddingIntact());
-      }
-    }
-  }
-  WorldBuffer world(1, 1, HX_FORMAT_ARGB8);
-  EXPECT_NE(Transfer(world.world(), {3, 0, 255, 0, 32768}, 0, 0, world.world()), 0);
-}
-
-// Longer and shorter runs of clear, opaque and other pixels; floats beyond any picture's.
-void FillRuns(WorldBuffer& buffer, unsigned seed) {
-  std::mt19937 random(seed);
-  std::uniform_real_distribution<double> value(0, 1);
-  const bool is_float = buffer.world().format == HX_FORMAT_ARGBF;
   for (int y = 0; y < buffer.world().height; ++y) {
     for (int x = 0; x < buffer.world().width;) {
       const unsigned kind = random() % 4;
       for (unsigned i = 1 + random() % (y % 2 ? 90 : 4); i > 0 && x < buffer.world().width; --i) {
         const double alpha = kind == 0 ? 0 : kind == 1 ? 1 : value(random);
         Put(buffer, x, y, {alpha, value(random), value(random), value(random)});
-        if (is_float && random() % 20 == 0) buffer.row<float>(y)[4 * x + 1] = 7;
-        if (is_float && random() % 50 == 0) buffer.row<float>(y)[4 * x] = random() % 2 ? -1 : 2;
+        if (wild && random() % 20 == 0) buffer.row<float>(y)[4 * x + 1] = 7;
+        if (wild && random() % 50 == 0) buffer.row<float>(y)[4 * x] = random() % 2 ? -1 : 2;
         ++x;
       }
     }
   }
 }
 
-TEST(Transfer, RunsThatNeedNoArithmeticAreExactAndTheOthersAsPixelByPixel) {
-  const int width = 301, height = 20;
-  for (const std::uint32_t format : kFormats) {
-    for (const int mode : {HX_TRANSFER_BEHIND, HX_TRANSFER_IN_FRONT}) {
-      for (const bool full : {true, false}) {
-        SCOPED_TRACE(testing::Message() << format << " " << mode << " " << full);
-        WorldBuffer from(width, height, format, 12), to(width, height, format, 8);
-        WorldBuffer single(width, height, format);
-        FillRuns(from, 1);
-        FillRuns(to, 2);
-        FillRuns(single, 2);
-        const HX_TransferMode record = {mode, 0, static_cast<std::uint8_t>(full ? 255 : 100), 0,
-                                        static_cast<std::uint16_t>(full ? 32768 : 10000)};
-        ASSERT_EQ(Transfer(from.world(), record, 0, 0, to.world()), 0);
-        const bool is_float = format == HX_FORMAT_ARGBF;
-        const auto opacity =
-            static_cast<float>(full                                     ? 1.0
-                               : is_float || format == HX_FORMAT_ARGB16 ? 10000 / 32768.0
-                                                                        : 100 / 255.0);
-        for (int y = 0; y < height; ++y) {
-          for (int x = 0; x < width; ++x) {
-            const Colour s = Get(from, x, y), d = Get(single, x, y), found = Get(to, x, y);
-            if (d[0] != 0 && (s[0] == 0 || (d[0] == 1 && mode == HX_TRANSFER_BEHIND))) {
-              ASSERT_EQ(found, d);
-            } else if (full && s[0] > 0 &&
-                       (d[0] == 0 || (s[0] == 1 && mode == HX_TRANSFER_IN_FRONT))) {
-              ASSERT_EQ(found, s);
-            } else {
-              // In the floats of the formula.
-              float front[4], back[4];
-              for (int c = 0; c < 4; ++c) {
-                front[c] = static_cast<float>(mode == HX_TRANSFER_BEHIND ? d[c] : s[c]);
-                back[c] = static_cast<float>(mode == HX_TRANSFER_BEHIND ? s[c] : d[c]);
-              }
-              (mode == HX_TRANSFER_BEHIND ? back : front)[0] *= opacity;
-              const float behind = back[0] * (1.0f - front[0]), alpha = front[0] + behind;
-              Colour expected{alpha};
-              for (int c = 1; c < 4; ++c) {
-                expected[c] = (front[c] * front[0] + back[c] * behind) / alpha;
-              }
-              if (!(alpha > 0)) expected = {};
-              for (int c = 0; c < 4; ++c) {
-                ASSERT_NEAR(found[c], expected[c], is_float ? 0 : 0.5 / Full(format) + 1e-6)
-                    << x << " " << y << " " << c;
-              }
-            }
+// s in front of d, in the floats of the formula.
+Colour InFront(const Colour& s, const Colour& d, float opacity_s, float opacity_d) {
+  float front[4], back[4];
+  std::copy(s.begin(), s.end(), front);
+  std::copy(d.begin(), d.end(), back);
+  front[0] *= opacity_s;
+  back[0] *= opacity_d;
+  const float behind = back[0] * (1.0f - front[0]), alpha = front[0] + behind;
+  if (!(alpha > 0)) return {};
+  Colour result{alpha};
+  for (int c = 1; c < 4; ++c) result[c] = (front[c] * front[0] + back[c] * behind) / alpha;
+  return result;
+}
+
+TEST(Transfer, WhatNeedsNoArithmeticIsExactAndAllElseAsTheFormulaTells) {
+  for (int i = 0; i < 64; ++i) {
+    const std::uint32_t from_format = kFormats[i % 4], to_format = kFormats[i / 4 % 4];
+    const bool in_front = i / 16 % 2, full = i / 32, same = from_format == to_format;
+    const bool is_float = to_format == HX_FORMAT_ARGBF;
+    SCOPED_TRACE(testing::Message() << from_format << " on " << to_format << " " << in_front);
+    WorldBuffer from(301, 9, from_format, 12), to(303, 8, to_format, 8), before(303, 8, to_format);
+    Fill(from, 1, same && is_float);
+    Fill(to, 2, same && is_float);
+    Fill(before, 2, same && is_float);
+    const HX_TransferMode mode = {in_front ? HX_TRANSFER_IN_FRONT : HX_TRANSFER_BEHIND, 0,
+                                  static_cast<std::uint8_t>(full ? 255 : 100), 0,
+                                  static_cast<std::uint16_t>(full ? 32768 : 10000)};
+    ASSERT_EQ(Transfer(from.world(), mode, -2, 1, to.world()), 0);
+    const float opacity = full ? 1.0f : Full(to_format) == 255 ? 100 / 255.0f : 10000 / 32768.0f;
+    for (int y = 0; y < 8; ++y) {
+      for (int x = 0; x < 303; ++x) {
+        const Colour d = Get(before, x, y), found = Get(to, x, y);
+        const bool inside = x < 299 && y >= 1;
+        const Colour s = inside ? Get(from, x + 2, y - 1) : Colour{};
+        if (!inside || (d[0] != 0 && (s[0] == 0 || (d[0] == 1 && !in_front)))) {
+          ASSERT_EQ(found, d) << x << " " << y;
+        } else if (same && full && s[0] > 0 && (d[0] == 0 || (s[0] == 1 && in_front))) {
+          ASSERT_EQ(found, s) << x << " " << y;
+        } else {
+          const Colour expected = in_front ? InFront(s, d, opacity, 1) : InFront(d, s, 1, opacity);
+          const double step = !is_float ? 0.5 / Full(to_format) + 1e-6 : same ? 0 : 1e-6;
+          for (int c = 0; c < 4; ++c) {
+            ASSERT_NEAR(found[c], expected[c], step) << x << " " << y << " " << c;
           }
         }
-        EXPECT_TRUE(to.PaddingIntact());
       }
     }
+    EXPECT_TRUE(to.PaddingIntact());
   }
+  WorldBuffer world(1, 1, HX_FORMAT_ARGB8);
+  EXPECT_NE(Transfer(world.world(), {3, 0, 255, 0, 32768}, 0, 0, world.world()), 0);
 }
 
 TEST(CopyWorld, MovesAndClipsWithoutChange) {
@@ -229,12 +164,8 @@ TEST(CopyWorld, ConvertsThereAndBackWithoutLoss) {
 
 TEST(CopyWorld, ShrinksByAreaWithColoursWeightedByAlpha) {
   WorldBuffer from(3, 2, HX_FORMAT_ARGBF), to(2, 1, HX_FORMAT_ARGBF);
-  Put(from, 0, 0, {1, 0.2, 0, 0});
-  Put(from, 1, 0, {1, 0.8, 0, 0});
-  Put(from, 2, 0, {0, 1, 0, 0});
-  Put(from, 0, 1, {1, 0.2, 0, 0});
-  Put(from, 1, 1, {1, 0.8, 0, 0});
-  Put(from, 2, 1, {1, 0.5, 0, 0});
+  const Colour colours[] = {{1, 0.2}, {1, 0.8}, {0, 1}, {1, 0.2}, {1, 0.8}, {1, 0.5}};
+  for (int i = 0; i < 6; ++i) Put(from, i % 3, i / 3, colours[i]);
   ASSERT_EQ(CopyWorld(from.world(), to.world(), nullptr, nullptr), 0);
   // Each target pixel covers 1.5 columns: two thirds of one, a third of the middle one.
   EXPECT_NEAR(Get(to, 0, 0)[1], (0.2 * 2 + 0.8) / 3, 1e-6);
@@ -253,52 +184,28 @@ TEST(CopyWorld, GrowsLinearlyBetweenPixelCentres) {
   for (int x = 0; x < 4; ++x) EXPECT_NEAR(Get(to, x, 0)[1], expected[x], 1e-6);
 }
 
-TEST(Blur, IsAGaussianOfHalfTheRadiusWithEdgesRepeated) {
-  for (const std::uint32_t format : kFormats) {
-    WorldBuffer from(21, 15, format), to(21, 15, format, 4);
-    for (int y = 0; y < 15; ++y) {
-      for (int x = 0; x < 21; ++x) Put(from, x, y, {1, x == 10 && y == 7 ? 1.0 : 0.0, 0.4, 0});
-    }
-    ASSERT_EQ(Blur(from.world(), to.world(), 3.0f), 0);
-    double sum = 0;
-    for (int y = 0; y < 15; ++y) {
-      for (int x = 0; x < 21; ++x) {
-        const Colour found = Get(to, x, y);
-        sum += found[1];
-        EXPECT_NEAR(found[0], 1, 1e-3);
-        EXPECT_NEAR(found[2], 0.4, 3e-3);
-        // Sampled at the pixels, sigma 1.5: the sum of the samples is 1.5 sqrt(2 pi) to 1e-9.
-        const double d2 = (x - 10) * (x - 10) + (y - 7) * (y - 7);
-        const double weight = std::exp(-d2 / 4.5) / (4.5 * M_PI);
-        EXPECT_NEAR(found[1], weight, format == HX_FORMAT_ARGBF ? 5e-4 : 3e-3);
-      }
-    }
-    if (format == HX_FORMAT_ARGBF) {
-      EXPECT_NEAR(sum, 1, 1e-4);
-    }
-    ASSERT_EQ(Blur(from.world(), to.world(), 0.0f), 0);
-    EXPECT_EQ(Get(to, 10, 7), Get(from, 10, 7));
-  }
-}
-
-// Sizes that a kernel, a band of rows or a vector doesn't divide, and kernels wider than a frame.
-TEST(Blur, IsTheSumOverItsSquareAtEveryPixel) {
+// Sizes that a kernel, a band of rows or a vector doesn't divide, and kernels wider than a frame;
+// edges are repeated.
+TEST(Blur, IsTheGaussianSumOverItsSquareAtEveryPixel) {
   const struct {
     int width, height;
     float radius;
-  } cases[] = {{37, 150, 5.3f}, {5, 3, 16.0f}, {1, 9, 2.0f}};
+    std::uint32_t format;
+  } cases[] = {{37, 150, 5.3f, HX_FORMAT_ARGBF}, {5, 3, 16.0f, HX_FORMAT_ARGBF},
+               {1, 9, 2.0f, HX_FORMAT_ARGBF},    {21, 15, 3.0f, HX_FORMAT_ARGB8},
+               {21, 15, 3.0f, HX_FORMAT_BGRA8},  {21, 15, 3.0f, HX_FORMAT_ARGB16},
+               {21, 15, 0.0f, HX_FORMAT_ARGB16}};
   for (const auto& c : cases) {
-    WorldBuffer from(c.width, c.height, HX_FORMAT_ARGBF, 8), to(c.width, c.height, HX_FORMAT_ARGBF);
+    SCOPED_TRACE(testing::Message() << c.width << " " << c.radius << " " << c.format);
+    WorldBuffer from(c.width, c.height, c.format, 8), to(c.width, c.height, c.format);
+    const double wild = c.format == HX_FORMAT_ARGBF ? 5.0 : 10.0;  // floats beyond full ones
     for (int y = 0; y < c.height; ++y) {
       for (int x = 0; x < c.width; ++x) {
-        Put(from, x, y, {(x * 7 + y) % 5 / 4.0, (x * y) % 11 / 5.0 - 1, (x + 3 * y) % 7 / 6.0, 1});
+        Put(from, x, y, {(x * 7 + y) % 5 / 4.0, (x * y) % 11 / wild, (x + 3 * y) % 7 / 6.0, 1});
       }
     }
     const double sigma = c.radius / 2.0;
     const int reach = static_cast<int>(std::ceil(3 * sigma));
-    const auto at = [&](int x, int y) {
-      return Get(from, std::clamp(x, 0, c.width - 1), std::clamp(y, 0, c.height - 1));
-    };
     ASSERT_EQ(Blur(from.world(), to.world(), c.radius), 0);
     for (int y = 0; y < c.height; ++y) {
       for (int x = 0; x < c.width; x += 3) {
@@ -306,14 +213,16 @@ TEST(Blur, IsTheSumOverItsSquareAtEveryPixel) {
         double weights = 0;
         for (int v = -reach; v <= reach; ++v) {
           for (int u = -reach; u <= reach; ++u) {
-            const double w = std::exp(-0.5 * (u * u + v * v) / (sigma * sigma));
-            const Colour p = at(x + u, y + v);
+            const double w = reach ? std::exp(-0.5 * (u * u + v * v) / (sigma * sigma)) : 1;
+            const Colour p =
+                Get(from, std::clamp(x + u, 0, c.width - 1), std::clamp(y + v, 0, c.height - 1));
             for (std::size_t i = 0; i < 4; ++i) sum[i] += w * p[i];
             weights += w;
           }
         }
+        const double step = wild == 5.0 ? 2e-6 : 0.5 / Full(c.format) + 2e-6;
         for (std::size_t i = 0; i < 4; ++i) {
-          ASSERT_NEAR(Get(to, x, y)[i], sum[i] / weights, 2e-6) << x << ", " << y;
+          ASSERT_NEAR(Get(to, x, y)[i], sum[i] / weights, step) << x << ", " << y;
         }
       }
     }
@@ -333,14 +242,16 @@ TEST(ColourOfHls, LightnessIsTheBrightestComponent) {
     const HX_Pixel8 rgb = ColourOfHls(hls);
     return std::array<int, 4>{rgb.alpha, rgb.red, rgb.green, rgb.blue};
   };
-  using Rgb = std::array<int, 4>;
-  EXPECT_EQ(colour(0, 1, 1), (Rgb{255, 255, 0, 0}));
-  EXPECT_EQ(colour(1.0 / 4, 1, 1), (Rgb{255, 128, 255, 0}));
-  EXPECT_EQ(colour(0.5, 1, 1), (Rgb{255, 0, 255, 255}));
-  EXPECT_EQ(colour(0.75, 1, 1), (Rgb{255, 128, 0, 255}));
-  EXPECT_EQ(colour(1, 1, 1), (Rgb{255, 255, 0, 0}));
-  EXPECT_EQ(colour(0.5, 0.5, 0.5), (Rgb{255, 64, 128, 128}));
-  EXPECT_EQ(colour(0.3, 1, 0), (Rgb{255, 255, 255, 255}));
+  const struct {
+    double hue, lightness, saturation;
+    std::array<int, 4> rgb;
+  } cases[] = {{0, 1, 1, {255, 255, 0, 0}},      {0.25, 1, 1, {255, 128, 255, 0}},
+               {0.5, 1, 1, {255, 0, 255, 255}},  {0.75, 1, 1, {255, 128, 0, 255}},
+               {1, 1, 1, {255, 255, 0, 0}},      {0.5, 0.5, 0.5, {255, 64, 128, 128}},
+               {0.3, 1, 0, {255, 255, 255, 255}}};
+  for (const auto& c : cases) {
+    EXPECT_EQ(colour(c.hue, c.lightness, c.saturation), c.rgb) << c.hue;
+  }
 }
 
 }  // namespace

@@ -42,9 +42,10 @@ PluginProperties Read(const std::string& record) {
   return ReadPropertyRecord(record.data(), record.size());
 }
 
-std::string Refusal(const std::string& record) {
+template <class Work>
+std::string Refusal(Work work) {
   try {
-    Read(record);
+    work();
   } catch (const PluginError& error) {
     return error.what();
   }
@@ -69,35 +70,36 @@ TEST(PropertyRecordReader, TakesPaddedAndUnpaddedLengthsAndSkipsUnknownKeys) {
 TEST(PropertyRecordReader, RefusesWhatIsCutAnywhere) {
   const std::string record = Whole(false);
   for (std::size_t size = 0; size + 1 < record.size(); ++size) {  // one byte of padding may be gone
-    EXPECT_NE(Refusal(record.substr(0, size)), "none") << size;
+    EXPECT_NE(Refusal([&] { Read(record.substr(0, size)); }), "none") << size;
   }
-  EXPECT_EQ(Refusal(record.substr(0, record.size() - 1)), "none");
+  EXPECT_EQ(Refusal([&] { Read(record.substr(0, record.size() - 1)); }), "none");
 }
 
 TEST(PropertyRecordReader, RefusesDamageWithItsCause) {
   const auto damaged = [](std::size_t at, const std::string& bytes) {
     return Whole(true).replace(at, bytes.size(), bytes);
   };
-  EXPECT_EQ(Refusal(damaged(0, "\2")), "property record of another version");
-  EXPECT_EQ(Refusal(damaged(2, "\1")), "property record of another version");
-  EXPECT_EQ(Refusal(damaged(6, "\x7")), "property record ends within a property");
-  EXPECT_EQ(Refusal(damaged(10, "XVN7")), "property of another vendor");
-  EXPECT_EQ(Refusal(damaged(26, "TKFy")), "plug-in of another kind");
-  EXPECT_EQ(Refusal(damaged(22, "\xff\xff\xff\xff")), "property record ends within a property");
-  EXPECT_EQ(Refusal(damaged(46, "\x08")), "property \"eman\" is too short");
-  EXPECT_EQ(Refusal(Header(1) + Property("dnik", "TKFx")), "property record without an entry");
-  EXPECT_EQ(Refusal(Header(1) + Property("4668", "Main")), "property \"4668\" has no end");
-  EXPECT_EQ(Refusal(Header(0)), "property record without a kind");
+  const struct {
+    std::string record;
+    const char* cause;
+  } cases[] = {
+      {damaged(0, "\2"), "property record of another version"},
+      {damaged(2, "\1"), "property record of another version"},
+      {damaged(6, "\x7"), "property record ends within a property"},
+      {damaged(10, "XVN7"), "property of another vendor"},
+      {damaged(26, "TKFy"), "plug-in of another kind"},
+      {damaged(22, "\xff\xff\xff\xff"), "property record ends within a property"},
+      {damaged(46, "\x08"), "property \"eman\" is too short"},
+      {Header(1) + Property("dnik", "TKFx"), "property record without an entry"},
+      {Header(1) + Property("4668", "Main"), "property \"4668\" has no end"},
+      {Header(0), "property record without a kind"},
+  };
+  for (const auto& c : cases) EXPECT_EQ(Refusal([&] { Read(c.record); }), c.cause);
 }
 
 TEST(PluginLibraryTest, RefusalsNameTheFile) {
-  const auto refusal = [](const std::string& path) {
-    try {
-      PluginLibrary library(path);
-    } catch (const PluginError& error) {
-      return std::string(error.what());
-    }
-    return "none"s;
+  const auto refusal = [](const char* path) {
+    return Refusal([&] { PluginLibrary library(path); });
   };
   EXPECT_NE(refusal("/nowhere/plugin.so").find("/nowhere/plugin.so: "), std::string::npos);
   EXPECT_EQ(refusal(OTHER_LIBRARY), OTHER_LIBRARY ": not a plug-in, it has no property record");
@@ -107,7 +109,7 @@ TEST(PluginLibraryTest, FindsEntryAndExports) {
   const PluginLibrary library(PROBE_PLUGIN);
   EXPECT_EQ(library.properties().match_name, "Probe");
   EXPECT_EQ(library.properties().entry, "ProbeMain");
-  EXPECT_EQ(library.entry()(19, nullptr, nullptr, nullptr, nullptr, nullptr), 0);
+  EXPECT_EQ(library.entry()(HX_CMD_ABOUT, nullptr, nullptr, nullptr, nullptr, nullptr), 0);
   EXPECT_EQ(library.exports().allow_cuda_rendering, nullptr);
 }
 

@@ -1,8 +1,9 @@
 #include <fstream>
 #include <thread>
 
+#include "host/timeline/source.h"
 #include "tests/host/media/clip_fixture.h"
-#include "tests/host/timeline/timeline_fixture.h"
+#include "tests/support/drawn_clip.h"
 
 namespace calmframe::host {
 namespace {
@@ -14,21 +15,15 @@ class ClipSourceTest : public media::ClipTest {
 
   // A lossy clip with several keyframes, each frame of its own colours.
   std::string Clip(const std::string& name) {
-    const media::ClipInfo info = Made(kWidth, kHeight, kFrames);
-    const auto writer = media::ClipWriter::Create(In(name), info, kWidth, kHeight, {});
-    std::vector<HX_Pixel8> pixels(std::size_t{kWidth} * kHeight);
-    for (std::size_t frame = 0; frame < kFrames; ++frame) {
-      for (std::size_t i = 0; i < pixels.size(); ++i) {
+    WriteClip(In(name), Made(kWidth, kHeight, kFrames), [](int frame, HX_Pixel8* pixels) {
+      for (int i = 0; i < kWidth * kHeight; ++i) {
         pixels[i] = {255, static_cast<std::uint8_t>(6 * frame),
                      static_cast<std::uint8_t>(4 * (i % kWidth)),
                      static_cast<std::uint8_t>(i / kWidth + 90 * (frame % 2))};
       }
-      WriteFrame(*writer, frame, kWidth, pixels);
-    }
-    writer->Finish();
+    });
     return In(name);
   }
-
   template <class Pixel>
   static std::vector<Pixel> PixelsOf(const PicturePtr& picture) {
     std::vector<Pixel> pixels;
@@ -71,7 +66,7 @@ TEST_F(ClipSourceTest, ThreadsThatShareItGetTheFramesTheyAskFor) {
   for (std::size_t f = 0; f < kFrames; ++f) {
     expected.push_back(red(source->Fetch(static_cast<std::int64_t>(f), PixelKind::argb8)));
   }
-  std::vector<std::thread> threads;
+  std::vector<std::jthread> threads;
   for (std::int64_t first : {0, 1, 2, 20}) {
     threads.emplace_back([&, first] {
       for (std::int64_t f = first; f < static_cast<std::int64_t>(kFrames); f += 3) {
@@ -79,7 +74,6 @@ TEST_F(ClipSourceTest, ThreadsThatShareItGetTheFramesTheyAskFor) {
       }
     });
   }
-  for (std::thread& thread : threads) thread.join();
 }
 
 TEST_F(ClipSourceTest, ContentIsTheIdentityAndTheNameIsNot) {
@@ -101,23 +95,6 @@ TEST_F(ClipSourceTest, RatesAspectsAndFieldsAreThoseOfTheFile) {
   EXPECT_EQ(info.pixel_aspect.num, 10);
   EXPECT_EQ(info.pixel_aspect.den, 11u);
   EXPECT_EQ(info.field_type, HX_FIELD_FIRST_ORDER);
-}
-
-// A real file's frames through the whole of the services.
-TEST_F(ClipSourceTest, AnEffectsInputIsTheClip) {
-  const std::string path = Clip("a.mp4");
-  const auto reader = media::ClipReader::Open(path);
-  MediaServices services;
-  const auto layer = boost::make_shared<Layer>(OpenClip(path));
-  layer->InsertEffect(0, {41, "Own", "", {}});
-  const auto effect = reinterpret_cast<HX_EffectRef>(this);
-  services.AttachEffect(effect, layer, 41);
-  for (std::size_t f = 0; f < kFrames; ++f) {
-    InputRequest request;
-    request.time_ticks = static_cast<std::int64_t>(f) * 28224000;
-    EXPECT_TRUE(media::SamePixels(PixelsOf<HX_Pixel8>(services.Input(effect, request)),
-                                  ReadFrame<HX_Pixel8>(*reader, f)));
-  }
 }
 
 }  // namespace

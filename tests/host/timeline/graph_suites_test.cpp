@@ -9,19 +9,8 @@ namespace {
 
 using tessel::utility::Guid;
 
-constexpr std::int64_t kFrame = 28224000;  // ticks at 25 frames a second
-
 class GraphSuitesTest : public TimelineTest {
  protected:
-  // The node that stands at a time, or 0.
-  HX_Node NodeAt(std::int64_t ticks) {
-    HX_Segments segments = 0;
-    HX_Node node = 0;
-    EXPECT_EQ(sequence.AcquireSegments(effect, &segments), HX_ERR_NONE);
-    graph.GetSegmentNodeAt(segments, ticks, &node);
-    EXPECT_EQ(sequence.ReleaseSegments(segments), HX_ERR_NONE);
-    return node;
-  }
   std::int64_t Property(HX_Node node, const char* key) {
     HX_String text = nullptr;
     if (graph.GetProperty(node, key, &text) != HX_ERR_NONE) return -1;
@@ -41,27 +30,23 @@ class GraphSuitesTest : public TimelineTest {
   };
   Chain Walk() {
     Chain chain;
-    HX_Node node = NodeAt(0);
-    while (node != 0) {
+    for (int level = 0, inputs = 1; inputs == 1; ++level) {
+      const Node node = NodeBelow(level);
       chain.guids.push_back(GuidOf(node));
       EXPECT_EQ(Property(node, HX_PROPERTY_STREAM_WIDTH), 6) << "passed down by every node";
-      std::int32_t operators = -1, inputs = -1;
+      std::int32_t operators = -1;
+      HX_Node child = 0;
       EXPECT_EQ(graph.GetOperatorCount(node, &operators), HX_ERR_NONE);
       EXPECT_EQ(graph.GetInputCount(node, &inputs), HX_ERR_NONE);
       EXPECT_EQ(operators, inputs) << "an effect a node, and none on the media";
-      HX_Node effect_operator = 0, input = 0;
-      if (operators == 1) {
-        EXPECT_EQ(graph.GetOperator(node, 0, &effect_operator), HX_ERR_NONE);
-        EXPECT_EQ(graph.GetInput(node, 0, &input), HX_ERR_NONE);
-        HX_String text = nullptr;
-        EXPECT_EQ(graph.GetOperatorText(effect_operator, &text), HX_ERR_NONE);
-        chain.texts.push_back(Take(text));
-        chain.ids.push_back(Property(effect_operator, HX_PROPERTY_RUNTIME_INSTANCE_ID));
-        EXPECT_EQ(graph.ReleaseNode(effect_operator), HX_ERR_NONE);
-      }
-      EXPECT_NE(graph.GetInput(node, inputs, &effect_operator), HX_ERR_NONE);
-      EXPECT_EQ(graph.ReleaseNode(node), HX_ERR_NONE);
-      node = input;
+      EXPECT_NE(graph.GetInput(node, inputs, &child), HX_ERR_NONE);
+      if (operators == 0) break;
+      EXPECT_EQ(graph.GetOperator(node, 0, &child), HX_ERR_NONE);
+      const Node effect_operator(graph, child);
+      HX_String text = nullptr;
+      EXPECT_EQ(graph.GetOperatorText(effect_operator, &text), HX_ERR_NONE);
+      chain.texts.push_back(Take(text));
+      chain.ids.push_back(Property(effect_operator, HX_PROPERTY_RUNTIME_INSTANCE_ID));
     }
     return chain;
   }
@@ -116,48 +101,45 @@ TEST_F(GraphSuitesTest, ALayerStandsFromItsInPointForItsLength) {
     state.start_frame = -2;
     state.length = 5;
   });
-  const auto stands = [&](std::int64_t ticks) {
-    const HX_Node node = NodeAt(ticks);
-    if (node != 0) graph.ReleaseNode(node);
-    return node != 0;
-  };
+  const auto stands = [&](std::int64_t ticks) { return Node(graph, TopAt(ticks)) != 0; };
   EXPECT_FALSE(stands(-2 * kFrame - 1));
   EXPECT_TRUE(stands(-2 * kFrame));
   EXPECT_TRUE(stands(3 * kFrame - 1));
   EXPECT_FALSE(stands(3 * kFrame));
+  services.faults.node_missing = true;
+  EXPECT_FALSE(stands(0));
+  services.faults.node_missing = false;
   layer->Change([](LayerState& state) { state.length = 0; });
   EXPECT_FALSE(stands(-2 * kFrame));
-  services.faults.node_missing = true;
-  layer->Change([](LayerState& state) { state.length = 5; });
-  EXPECT_FALSE(stands(0));
   std::int64_t ticks = 0;
   EXPECT_EQ(sequence.GetTicksPerFrame(effect, &ticks), HX_ERR_NONE);
   EXPECT_EQ(ticks, kFrame);
 }
 
 TEST_F(GraphSuitesTest, PropertiesAreThoseOfTheMediaAsItIsShown) {
-  const HX_Node node = InputNode();
-  EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), 6);
-  EXPECT_EQ(Property(node, "MediaNode::StreamFrameHeight"), 4);
-  EXPECT_EQ(Property(node, "MediaNode::StreamPixelAspectRatioNum"), 16);
-  EXPECT_EQ(Property(node, "MediaNode::StreamPixelAspectRatioDen"), 15);
-  EXPECT_EQ(Property(node, "MediaNode::Unknown"), -1);
-  EXPECT_EQ(Property(node, "EffectNode::RuntimeInstanceID"), -1);
-  const std::string guid = GuidOf(node);
+  const Node node = InputNode();
+  const struct {
+    const char* key;
+    std::int64_t value;
+  } cases[] = {{"MediaNode::StreamFrameWidth", 6},
+               {"MediaNode::StreamFrameHeight", 4},
+               {"MediaNode::StreamPixelAspectRatioNum", 16},
+               {"MediaNode::StreamPixelAspectRatioDen", 15},
+               {"MediaNode::Unknown", -1},
+               {"EffectNode::RuntimeInstanceID", -1}};
+  for (const auto& c : cases) EXPECT_EQ(Property(node, c.key), c.value) << c.key;
   layer->Resize(1, 1);
   EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), 6) << "a reference shows what it was";
+  const Node resized = InputNode();
+  EXPECT_EQ(Property(resized, "MediaNode::StreamFrameWidth"), 1);
+  EXPECT_NE(GuidOf(resized), GuidOf(node));
   services.faults.property_missing = true;
   EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), -1);
-  services.faults.property_missing = false;
-  graph.ReleaseNode(node);
-  const HX_Node resized = InputNode();
-  EXPECT_EQ(Property(resized, "MediaNode::StreamFrameWidth"), 1);
-  EXPECT_NE(GuidOf(resized), guid);
-  graph.ReleaseNode(resized);
 }
 
 TEST_F(GraphSuitesTest, ADetachedEffectIsRefusedAndItsNodesGoOn) {
-  const HX_Node node = InputNode();
+  HX_Node node = 0;
+  EXPECT_EQ(graph.GetInput(NodeBelow(0), 0, &node), HX_ERR_NONE);
   services.DetachEffect(effect);
   services.DetachEffect(effect);
   HX_Segments segments = 0;
@@ -173,8 +155,7 @@ TEST_F(GraphSuitesTest, ADetachedEffectIsRefusedAndItsNodesGoOn) {
 
 TEST_F(GraphSuitesTest, OperationsFailOnOrderAndGiveBackAllTheSame) {
   Operations::Get().FailAlways("Video Segment.ReleaseNode");
-  const HX_Node node = NodeAt(0);
-  EXPECT_EQ(graph.ReleaseNode(node), kFaultCode);
+  EXPECT_EQ(graph.ReleaseNode(TopAt(0)), kFaultCode);
   EXPECT_EQ(services.counts().nodes, 0u);
   Operations::Get().FailAlways("Sequence Info.AcquireSegments");
   HX_Segments segments = 0;

@@ -46,7 +46,7 @@ TEST(Layer, NoChangeIsLostBetweenThreads) {
   const auto grow = [&] {
     for (int i = 0; i < 500; ++i) layer.Change([](LayerState& state) { ++state.start_frame; });
   };
-  std::thread other(grow);
+  std::jthread other(grow);
   std::int32_t seen = 0;
   while (seen < 200) {
     const std::int32_t now = layer.state()->start_frame;

@@ -28,6 +28,24 @@ inline void DrawFrame(std::int64_t frame, Picture& picture) {
   });
 }
 
+constexpr std::int64_t kFrame = 28224000;  // ticks at 25 frames a second
+
+// A reference to a node, or none, for as long as this stands.
+class Node {
+ public:
+  Node(const HX_VideoSegmentSuite5& graph, HX_Node node) : graph_(graph), node_(node) {}
+  ~Node() {
+    if (node_ != 0) graph_.ReleaseNode(node_);
+  }
+  Node(const Node&) = delete;
+  Node& operator=(const Node&) = delete;
+  operator HX_Node() const { return node_; }
+
+ private:
+  const HX_VideoSegmentSuite5& graph_;
+  const HX_Node node_;
+};
+
 // A plug-in's view of the services: an effect on a layer of drawn media of 6 by 4 pixels, and the
 // tables. At the end nothing that was lent may be missing.
 class TimelineTest : public testing::Test {
@@ -41,12 +59,8 @@ class TimelineTest : public testing::Test {
   ~TimelineTest() override {
     services.Shutdown();
     const MediaCounts counts = services.counts();
-    EXPECT_EQ(counts.nodes, 0u);
-    EXPECT_EQ(counts.segments, 0u);
-    EXPECT_EQ(counts.strings, 0u);
-    EXPECT_EQ(counts.frames, 0u);
-    EXPECT_EQ(counts.references, 0u);
-    EXPECT_EQ(counts.requests, 0u);
+    EXPECT_EQ(counts.nodes + counts.segments + counts.strings + counts.frames, 0u);
+    EXPECT_EQ(counts.references + counts.requests, 0u);
     EXPECT_EQ(Ledger::Get().Report(), mistakes);
   }
 
@@ -65,22 +79,27 @@ class TimelineTest : public testing::Test {
     return taken;
   }
 
-  // The node so many levels beneath the top one; 1 enters the effect if none is downstream.
-  HX_Node NodeBelow(int levels) {
+  // The top node that stands at a time, or 0.
+  HX_Node TopAt(std::int64_t ticks) {
     HX_Segments segments = 0;
     HX_Node node = 0;
     EXPECT_EQ(sequence.AcquireSegments(effect, &segments), HX_ERR_NONE);
-    EXPECT_EQ(graph.GetSegmentNodeAt(segments, 0, &node), HX_ERR_NONE);
+    graph.GetSegmentNodeAt(segments, ticks, &node);
     EXPECT_EQ(sequence.ReleaseSegments(segments), HX_ERR_NONE);
+    return node;
+  }
+  // The node so many levels beneath the top one; 1 enters the effect if none is downstream.
+  Node NodeBelow(int levels) {
+    HX_Node node = TopAt(0);
     while (levels-- > 0) {
       HX_Node input = 0;
       EXPECT_EQ(graph.GetInput(node, 0, &input), HX_ERR_NONE);
       EXPECT_EQ(graph.ReleaseNode(node), HX_ERR_NONE);
       node = input;
     }
-    return node;
+    return {graph, node};
   }
-  HX_Node InputNode() { return NodeBelow(1); }
+  Node InputNode() { return NodeBelow(1); }
 
   static constexpr std::uint32_t kOwnId = 41;
   MediaServices services;
