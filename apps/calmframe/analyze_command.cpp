@@ -13,19 +13,18 @@
 namespace calmframe {
 
 AnalyzeCommand::AnalyzeCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "analyze",
+    : Command(AddCommand(
+          program, "analyze",
           "Tell what would become of a clip, without rendering it\n\n"
           "Prints the crop window and how far it is enlarged. With --project, stabilize and render "
-          "go on from there.")) {
-  AddFile(*command_, "IN", input_, "The shaky clip")->required();
-  AddControlFlags(*command_, controls_);
-  AddProjectFlag(*command_, project_);
-  AddRunFlags(*command_, run_);
-  command_->footer(
-      "Examples:\n"
-      "  calmframe analyze shaky.mp4\n"
-      "  calmframe analyze shaky.mp4 --project shaky.calm --smoothness 20");
+          "go on from there.",
+          "Examples:\n"
+          "  calmframe analyze shaky.mp4\n"
+          "  calmframe analyze shaky.mp4 --project shaky.calm --smoothness 20")) {
+  AddFile(parser_, "IN", input_, "The shaky clip");
+  AddControlFlags(parser_, controls_);
+  AddProjectFlag(parser_, project_);
+  AddRunFlags(parser_, run_);
 }
 
 void AnalyzeCommand::Run() {

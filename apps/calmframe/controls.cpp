@@ -1,5 +1,6 @@
 #include "apps/calmframe/controls.h"
 
+#include <CLI/CLI.hpp>
 #include <algorithm>
 #include <cctype>
 #include <cmath>

@@ -1,11 +1,11 @@
 #pragma once
 
-#include <CLI/CLI.hpp>
 #include <cstdint>
 #include <map>
 #include <string>
 #include <vector>
 
+#include "apps/calmframe/flags.h"
 #include "platform/hx/hx_params.h"
 
 namespace calmframe {

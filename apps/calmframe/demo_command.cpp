@@ -108,25 +108,22 @@ void WriteSideBySide(const std::string& left_path, const std::string& right_path
 }  // namespace
 
 DemoCommand::DemoCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "demo",
+    : Command(AddCommand(
+          program, "demo",
           "Make a shaky sample, steady it, and show both side by side\n\n"
           "Draws a walk down a street of its own making and leaves shaky.mp4, steady.mp4 and "
-          "side-by-side.mp4 in DIR, over those of an earlier demo.")) {
-  command_->add_option("DIR", directory_, "Where the three clips go")
-      ->type_name("DIR")
-      ->capture_default_str();
-  AddNumber<int>(
-      *command_, "--frames", [this](int frames) { frames_ = frames; }, "N", 2, 100000,
-      "Length of the sample, 30 frames a second")
-      ->default_str(std::to_string(frames_));
-  AddControlFlags(*command_, controls_);
-  AddOutputFlags(*command_, flags_);
-  AddRunFlags(*command_, run_);
-  command_->footer(
-      "Examples:\n"
-      "  calmframe demo\n"
-      "  calmframe demo still --frames 60 --result no-motion");
+          "side-by-side.mp4 in DIR, over those of an earlier demo.",
+          "Examples:\n"
+          "  calmframe demo\n"
+          "  calmframe demo still --frames 60 --result no-motion")) {
+  AddFolder(parser_, "DIR", directory_, "Where the three clips go");
+  TellDefault(*AddNumber<int>(
+                  parser_, "--frames", [this](int frames) { frames_ = frames; }, "N", 2, 100000,
+                  "Length of the sample, 30 frames a second"),
+              std::to_string(frames_));
+  AddControlFlags(parser_, controls_);
+  AddOutputFlags(parser_, flags_);
+  AddRunFlags(parser_, run_);
 }
 
 void DemoCommand::Run() {

@@ -1,23 +1,21 @@
 #pragma once
 
-#include <CLI/CLI.hpp>
 #include <string>
 
+#include "apps/calmframe/command.h"
 #include "apps/calmframe/stabilize_command.h"
 
 namespace calmframe {
 
 // `calmframe demo [DIR]`: makes a shaky sample of a procedural scene, steadies it, and writes both
 // and a side-by-side.
-class DemoCommand {
+class DemoCommand final : public Command {
  public:
   explicit DemoCommand(CLI::App& program);
-  bool chosen() const { return command_->parsed(); }
-  bool json() const { return run_.json; }
-  void Run();
+  bool json() const override { return run_.json; }
+  void Run() override;
 
  private:
-  CLI::App* const command_;
   std::string directory_ = "calmframe-demo";
   int frames_ = 240;
   ControlFlags controls_;

@@ -1,5 +1,6 @@
 #include "apps/calmframe/flags.h"
 
+#include <CLI/CLI.hpp>
 #include <algorithm>
 #include <limits>
 
@@ -7,6 +8,13 @@
 #include "host/base/nearest_match.h"
 
 namespace calmframe {
+
+CLI::App& AddCommand(CLI::App& program, const std::string& name, const std::string& description,
+                     const std::string& examples) {
+  CLI::App& command = *program.add_subcommand(name, description);
+  command.footer(examples);
+  return command;
+}
 
 template <class Number>
 CLI::Option* AddNumber(CLI::App& command, const std::string& flag,
@@ -44,9 +52,38 @@ CLI::Option* AddChoice(CLI::App& command, const std::string& flag,
       ->type_name(CLI::detail::join(choices, "|"));
 }
 
-CLI::Option* AddFile(CLI::App& command, const std::string& name, std::string& path,
+CLI::Option* AddName(CLI::App& command, const std::string& flag, std::string& name,
                      const std::string& description) {
-  return command.add_option(name, path, description)->type_name("FILE");
+  return command.add_option(flag, name, description)->type_name("NAME");
+}
+
+CLI::Option* AddSwitch(CLI::App& command, const std::string& flag, bool& on,
+                       const std::string& description) {
+  return command.add_flag(flag, on, description);
+}
+
+CLI::Option* AddFile(CLI::App& command, const std::string& name, std::string& path,
+                     const std::string& description, Need need) {
+  return command.add_option(name, path, description)
+      ->type_name("FILE")
+      ->required(need == Need::required);
+}
+
+CLI::Option* AddFolder(CLI::App& command, const std::string& name, std::string& path,
+                       const std::string& description) {
+  return command.add_option(name, path, description)->type_name("DIR")->capture_default_str();
+}
+
+void PutInGroup(const std::string& title, std::initializer_list<CLI::Option*> flags) {
+  for (CLI::Option* flag : flags) flag->group(title);
+}
+
+void TellDefault(CLI::Option& flag, const std::string& value) {
+  flag.default_str(value);
+}
+
+void Exclude(CLI::Option& flag, CLI::Option& other) {
+  flag.excludes(&other);
 }
 
 std::string NoneOf(const std::string& text, const std::vector<std::string>& names) {

@@ -7,6 +7,7 @@
 #include <exception>
 #include <filesystem>
 #include <functional>
+#include <iterator>
 #include <new>
 #include <nlohmann/json.hpp>
 #include <string>
@@ -15,6 +16,7 @@
 #include <vector>
 
 #include "apps/calmframe/analyze_command.h"
+#include "apps/calmframe/command.h"
 #include "apps/calmframe/demo_command.h"
 #include "apps/calmframe/exit_codes.h"
 #include "apps/calmframe/failures.h"
@@ -101,20 +103,18 @@ int FailUsage(const CLI::App& program, const CLI::ParseError& error, int argc, c
 }
 
 // Added to the parser but to no list: what the packages bring is written by the program itself.
-class WriteCommand {
+class WriteCommand final : public Command {
  public:
-  WriteCommand(CLI::App& program, const std::string& name,
-               std::function<std::string(const CLI::App&)> text)
-      : program_(program), command_(program.add_subcommand(name)), text_(std::move(text)) {
-    command_->group("");
-  }
-  bool chosen() const { return command_->parsed(); }
-  void Run() const { std::fputs(text_(program_).c_str(), stdout); }
+  using Text = std::function<std::string(const CLI::App& program)>;
+  WriteCommand(CLI::App& program, const std::string& name, Text text)
+      : Command(*program.add_subcommand(name)->group("")),
+        program_(program),
+        text_(std::move(text)) {}
+  void Run() override { std::fputs(text_(program_).c_str(), stdout); }
 
  private:
   const CLI::App& program_;
-  CLI::App* const command_;
-  const std::function<std::string(const CLI::App&)> text_;
+  const Text text_;
 };
 
 constexpr char kDescription[] =
@@ -154,12 +154,14 @@ int Run(int argc, char** argv) {
   InfoCommand info(program);
   TracksCommand tracks(program);
   ReportCommand report(program);
-  const WriteCommand writers[] = {
-      {program, "write-man-page",
-       [](const CLI::App& app) { return manual::ManPage(app, CALMFRAME_VERSION); }},
-      {program, "write-bash-completion", manual::BashCompletion},
-      {program, "write-zsh-completion", manual::ZshCompletion},
-      {program, "write-fish-completion", manual::FishCompletion}};
+  WriteCommand man_page(program, "write-man-page", [](const CLI::App& app) {
+    return manual::ManPage(app, CALMFRAME_VERSION);
+  });
+  WriteCommand bash(program, "write-bash-completion", manual::BashCompletion);
+  WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
+  WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
+  Command* const commands[] = {&stabilize, &demo,   &analyze,  &params, &render, &info,
+                               &tracks,    &report, &man_page, &bash,   &zsh,    &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;
@@ -177,21 +179,13 @@ int Run(int argc, char** argv) {
     return FailUsage(program, error, argc, argv);
   }
 
-  const bool json =
-      stabilize.json() || demo.json() || analyze.json() || render.json() || report.json();
+  // The parser has seen to it that there is one.
+  Command& command = **std::find_if(std::begin(commands), std::end(commands),
+                                    [](const Command* one) { return one->parser().parsed(); });
+  const bool json = command.json();
   CatchInterrupts();
   try {
-    if (stabilize.chosen()) stabilize.Run();
-    if (demo.chosen()) demo.Run();
-    if (analyze.chosen()) analyze.Run();
-    if (params.chosen()) params.Run();
-    if (render.chosen()) render.Run();
-    if (info.chosen()) info.Run();
-    if (tracks.chosen()) tracks.Run();
-    if (report.chosen()) report.Run();
-    for (const WriteCommand& writer : writers) {
-      if (writer.chosen()) writer.Run();
-    }
+    command.Run();
     return kDone;
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);

@@ -46,18 +46,18 @@ nlohmann::ordered_json JsonOf(const HX_ParamDef& param, double value) {
 }  // namespace
 
 ParamsCommand::ParamsCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "params",
+    : Command(AddCommand(
+          program, "params",
           "List every parameter with its range and default\n\n"
           "The names are those that --param takes. Where a value differs from the default, by a "
-          "flag or in saved work, it is told too.")) {
-  AddFile(*command_, "--project", project_, "Tell the values that this saved work has");
-  command_->add_flag("--json", json_, "As a JSON array");
-  AddControlFlags(*command_, controls_);
-  command_->footer(
-      "Examples:\n"
-      "  calmframe params\n"
-      "  calmframe params --experimental --param \"Rank=12\" --json");
+          "flag or in saved work, it is told too.",
+          "Examples:\n"
+          "  calmframe params\n"
+          "  calmframe params --experimental --param \"Rank=12\" --json")) {
+  AddFile(parser_, "--project", project_, "Tell the values that this saved work has",
+          Need::optional);
+  AddSwitch(parser_, "--json", json_, "As a JSON array");
+  AddControlFlags(parser_, controls_);
 }
 
 void ParamsCommand::Run() {

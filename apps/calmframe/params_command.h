@@ -1,21 +1,19 @@
 #pragma once
 
-#include <CLI/CLI.hpp>
 #include <string>
 
+#include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
 
 namespace calmframe {
 
 // `calmframe params`: what the effect can be told, with ranges, defaults and present values.
-class ParamsCommand {
+class ParamsCommand final : public Command {
  public:
   explicit ParamsCommand(CLI::App& program);
-  bool chosen() const { return command_->parsed(); }
-  void Run();
+  void Run() override;
 
  private:
-  CLI::App* const command_;
   std::string project_;
   ControlFlags controls_;
   bool json_ = false;

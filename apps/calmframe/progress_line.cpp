@@ -6,6 +6,7 @@
 #include <cmath>
 #include <csignal>
 #include <cstdio>
+#include <nlohmann/json.hpp>
 
 namespace calmframe {
 namespace {

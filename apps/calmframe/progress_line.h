@@ -1,7 +1,7 @@
 #pragma once
 
 #include <chrono>
-#include <nlohmann/json.hpp>
+#include <nlohmann/json_fwd.hpp>
 #include <string>
 
 namespace calmframe {

@@ -34,27 +34,25 @@ media::ClipInfo PartOf(const media::ClipInfo& info, const FrameRange& range) {
 }  // namespace
 
 RenderCommand::RenderCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "render",
+    : Command(AddCommand(
+          program, "render",
           "Draw saved work, or a part of it\n\n"
           "With --from and --to a part, to look at before the whole is drawn; such a part is "
-          "without sound.")) {
-  AddFile(*command_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe")
-      ->required();
-  AddFile(*command_, "--project", project_, "The saved work")->required();
+          "without sound.",
+          "Examples:\n"
+          "  calmframe render --project shaky.calm steady.mp4\n"
+          "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20")) {
+  AddFile(parser_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe");
+  AddFile(parser_, "--project", project_, "The saved work");
   constexpr int kMost = std::numeric_limits<int>::max();
   AddNumber<int>(
-      *command_, "--from", [this](int frame) { from_ = static_cast<std::size_t>(frame); }, "FRAME",
-      0, kMost, "First frame, counted from 0");
+      parser_, "--from", [this](int frame) { from_ = static_cast<std::size_t>(frame); }, "FRAME", 0,
+      kMost, "First frame, counted from 0");
   AddNumber<int>(
-      *command_, "--to", [this](int frame) { to_ = static_cast<std::size_t>(frame); }, "FRAME", 0,
+      parser_, "--to", [this](int frame) { to_ = static_cast<std::size_t>(frame); }, "FRAME", 0,
       kMost, "Frame behind the last; the clip's end at first");
-  AddOutputFlags(*command_, flags_);
-  AddRunFlags(*command_, run_);
-  command_->footer(
-      "Examples:\n"
-      "  calmframe render --project shaky.calm steady.mp4\n"
-      "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20");
+  AddOutputFlags(parser_, flags_);
+  AddRunFlags(parser_, run_);
 }
 
 void RenderCommand::Run() {
@@ -79,13 +77,12 @@ void RenderCommand::Run() {
 }
 
 InfoCommand::InfoCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "info", "Tell what saved work holds, and whether its clip is still the one")) {
-  AddFile(*command_, "PROJECT", project_, "The saved work")->required();
-  command_->add_flag("--json", json_, "As a JSON object");
-  command_->footer(
-      "Examples:\n"
-      "  calmframe info shaky.calm");
+    : Command(AddCommand(program, "info",
+                         "Tell what saved work holds, and whether its clip is still the one",
+                         "Examples:\n"
+                         "  calmframe info shaky.calm")) {
+  AddFile(parser_, "PROJECT", project_, "The saved work");
+  AddSwitch(parser_, "--json", json_, "As a JSON object");
 }
 
 void InfoCommand::Run() {
@@ -120,13 +117,12 @@ void InfoCommand::Run() {
 }
 
 TracksCommand::TracksCommand(CLI::App& program)
-    : command_(program.add_subcommand("tracks", "Write the tracks of saved work to a file")) {
-  AddFile(*command_, "PROJECT", project_, "The saved work")->required();
-  AddFile(*command_, "OUT", output_, "The track file, .trk")->required();
-  command_->add_flag("--overwrite", overwrite_, "Replace OUT where it exists");
-  command_->footer(
-      "Examples:\n"
-      "  calmframe tracks shaky.calm shaky.trk");
+    : Command(AddCommand(program, "tracks", "Write the tracks of saved work to a file",
+                         "Examples:\n"
+                         "  calmframe tracks shaky.calm shaky.trk")) {
+  AddFile(parser_, "PROJECT", project_, "The saved work");
+  AddFile(parser_, "OUT", output_, "The track file, .trk");
+  AddSwitch(parser_, "--overwrite", overwrite_, "Replace OUT where it exists");
 }
 
 void TracksCommand::Run() {

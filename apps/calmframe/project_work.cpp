@@ -8,10 +8,13 @@
 namespace calmframe {
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
-  AddFile(command, "--project", project,
+  PutInGroup(
+      "Saved work",
+      {AddFile(
+          command, "--project", project,
           "Take up saved work from this file where it is there, with its controls, and save to it; "
-          "what still stands of it is not done again")
-      ->group("Saved work");
+          "what still stands of it is not done again",
+          Need::optional)});
 }
 
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,

@@ -17,9 +17,9 @@
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/track_export.h"
+#include "apps/report/data_url.h"
 #include "apps/report/model_scores.h"
 #include "apps/report/page.h"
-#include "apps/report/picture.h"
 #include "apps/report/plot.h"
 #include "apps/report/solve_section.h"
 #include "apps/report/solved_clip.h"
@@ -175,19 +175,19 @@ std::string NameOf(const std::string& path) {
 }  // namespace
 
 ReportCommand::ReportCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "report",
+    : Command(AddCommand(
+          program, "report",
           "Show saved work as a page\n\n"
           "Camera path before and after, tracks, models, crop, what is left empty, and a "
           "filmstrip, in one file for any browser. Where the clip is gone the page has all but the "
-          "filmstrip. Work is saved by stabilize and analyze with --project.")) {
-  AddFile(*command_, "PROJECT", project_, "The saved work")->required();
-  AddFile(*command_, "OUT", output_, "The page to write, .html")->required();
-  command_->add_flag("--overwrite", overwrite_, "Replace OUT where it exists")->group("Output");
-  AddRunFlags(*command_, run_);
-  command_->footer(
-      "Examples:\n"
-      "  calmframe report shaky.calm report.html");
+          "filmstrip. Work is saved by stabilize and analyze with --project.",
+          "Examples:\n"
+          "  calmframe report shaky.calm report.html")) {
+  AddFile(parser_, "PROJECT", project_, "The saved work");
+  AddFile(parser_, "OUT", output_, "The page to write, .html");
+  PutInGroup("Output",
+             {AddSwitch(parser_, "--overwrite", overwrite_, "Replace OUT where it exists")});
+  AddRunFlags(parser_, run_);
 }
 
 void ReportCommand::Run() {

@@ -64,52 +64,38 @@ void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
   if (!trouble.line.empty()) progress.Warn(trouble.line);
 }
 
-namespace {
-
-constexpr char kOutput[] = "Output";
-constexpr char kRunning[] = "Running";
-
-}  // namespace
-
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
-  AddNumber<int>(
-      command, "--threads", [&flags](int threads) { flags.threads = threads; }, "N", 1, 1024,
-      "Processors to use; all at first")
-      ->group(kRunning);
-  CLI::Option* quiet =
-      command.add_flag("--quiet", flags.quiet, "Show no progress; warnings and errors still");
-  quiet->group(kRunning);
-  command
-      .add_flag("--json", flags.json,
-                "Show progress, warnings and errors as JSON objects, one a line, for programs")
-      ->excludes(quiet)
-      ->group(kRunning);
+  CLI::Option* const threads = AddNumber<int>(
+      command, "--threads", [&flags](int count) { flags.threads = count; }, "N", 1, 1024,
+      "Processors to use; all at first");
+  CLI::Option* const quiet =
+      AddSwitch(command, "--quiet", flags.quiet, "Show no progress; warnings and errors still");
+  CLI::Option* const json =
+      AddSwitch(command, "--json", flags.json,
+                "Show progress, warnings and errors as JSON objects, one a line, for programs");
+  Exclude(*json, *quiet);
+  PutInGroup("Running", {threads, quiet, json});
 }
 
 void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
-  AddNumber<int>(
-      command, "--crf", [&flags](int crf) { flags.encode.crf = crf; }, "N", 0, 63,
-      "How much the encoder may lose: less looks better and makes larger files")
-      ->default_str(std::to_string(flags.encode.crf))
-      ->group(kOutput);
-  command
-      .add_option("--codec", flags.encode.codec,
-                  "Encoder, such as libx265, or the name of what it encodes; at first H.264, or "
-                  "what the kind of file takes")
-      ->type_name("NAME")
-      ->group(kOutput);
-  command
-      .add_option("--pixel-format", flags.encode.pixel_format,
-                  "Pixel format of the encoder; at first 4:2:0 of the clip's depth")
-      ->type_name("NAME")
-      ->group(kOutput);
-  AddChoice(
+  CLI::Option* const crf = AddNumber<int>(
+      command, "--crf", [&flags](int value) { flags.encode.crf = value; }, "N", 0, 63,
+      "How much the encoder may lose: less looks better and makes larger files");
+  TellDefault(*crf, std::to_string(flags.encode.crf));
+  CLI::Option* const codec =
+      AddName(command, "--codec", flags.encode.codec,
+              "Encoder, such as libx265, or the name of what it encodes; at first H.264, or what "
+              "the kind of file takes");
+  CLI::Option* const pixel_format =
+      AddName(command, "--pixel-format", flags.encode.pixel_format,
+              "Pixel format of the encoder; at first 4:2:0 of the clip's depth");
+  CLI::Option* const depth = AddChoice(
       command, "--depth", [&flags](const std::string& bits) { flags.depth = std::stoi(bits); },
       {"8", "16", "32"},
-      "Bits of a component while frames are drawn; at first 8, or 16 for deeper clips")
-      ->group(kOutput);
-  command.add_flag("--overwrite", flags.encode.overwrite, "Replace OUT where it exists")
-      ->group(kOutput);
+      "Bits of a component while frames are drawn; at first 8, or 16 for deeper clips");
+  CLI::Option* const overwrite =
+      AddSwitch(command, "--overwrite", flags.encode.overwrite, "Replace OUT where it exists");
+  PutInGroup("Output", {crf, codec, pixel_format, depth, overwrite});
 }
 
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
@@ -135,27 +121,25 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
 }
 
 StabilizeCommand::StabilizeCommand(CLI::App& program)
-    : command_(program.add_subcommand(
-          "stabilize",
+    : Command(AddCommand(
+          program, "stabilize",
           "Steady a clip\n\n"
           "Writes the clip IN to OUT with its shake smoothed away; sound, subtitles and time "
           "stamps "
           "stay as they were. It needs no flag. Where the result isn't yet as you want it, reach "
           "for --smoothness first, then for --framing.\n\n"
           "OUT's extension picks the kind of file. OUT is there when it is whole: a run that fails "
-          "or is stopped leaves none.")) {
-  AddFile(*command_, "IN", input_, "The shaky clip")->required();
-  AddFile(*command_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe")
-      ->required();
-  AddControlFlags(*command_, controls_);
-  AddOutputFlags(*command_, flags_);
-  AddProjectFlag(*command_, project_);
-  AddRunFlags(*command_, run_);
-  command_->footer(
-      "Examples:\n"
-      "  calmframe stabilize shaky.mp4 steady.mp4\n"
-      "  calmframe stabilize walk.mp4 calm.mp4 --smoothness 100\n"
-      "  calmframe stabilize talk.mp4 still.mp4 --result no-motion");
+          "or is stopped leaves none.",
+          "Examples:\n"
+          "  calmframe stabilize shaky.mp4 steady.mp4\n"
+          "  calmframe stabilize walk.mp4 calm.mp4 --smoothness 100\n"
+          "  calmframe stabilize talk.mp4 still.mp4 --result no-motion")) {
+  AddFile(parser_, "IN", input_, "The shaky clip");
+  AddFile(parser_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe");
+  AddControlFlags(parser_, controls_);
+  AddOutputFlags(parser_, flags_);
+  AddProjectFlag(parser_, project_);
+  AddRunFlags(parser_, run_);
 }
 
 void StabilizeCommand::Run() {

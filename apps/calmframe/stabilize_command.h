@@ -1,8 +1,8 @@
 #pragma once
 
-#include <CLI/CLI.hpp>
 #include <string>
 
+#include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/steady_clip.h"
@@ -48,15 +48,13 @@ CropTrouble CropTroubleOf(SteadyClip& clip);
 void CheckCrop(SteadyClip& clip, ProgressLine& progress);
 
 // `calmframe stabilize IN OUT`. Added to the program's parser; runs when that has chosen it.
-class StabilizeCommand {
+class StabilizeCommand final : public Command {
  public:
   explicit StabilizeCommand(CLI::App& program);
-  bool chosen() const { return command_->parsed(); }
-  bool json() const { return run_.json; }
-  void Run();
+  bool json() const override { return run_.json; }
+  void Run() override;
 
  private:
-  CLI::App* const command_;
   std::string input_, output_, project_;
   ControlFlags controls_;
   OutputFlags flags_;

@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <boost/make_shared.hpp>
 #include <chrono>
-#include <cstdio>
 #include <cstring>
 #include <numeric>
 #include <utility>
@@ -51,18 +50,9 @@ host::HostSettings SettingsFor(const media::ClipInfo& info, const ControlFlags& 
   return settings;
 }
 
-// "42% (frame 126 of 300)", as the effect shows it on its Cancel button.
-bool ParseFrames(const std::string& says, double* done, double* total) {
-  int percent = 0, frame = 0, count = 0;
-  const std::size_t of = says.find(" of ");
-  if (of == std::string::npos ||
-      std::sscanf(says.c_str(), "%d%% (frame %d", &percent, &frame) != 2 ||
-      std::sscanf(says.c_str() + of, " of %d", &count) != 1) {
-    return false;
-  }
-  *done = frame;
-  *total = count;
-  return true;
+// Frames that an analysis of the layer asks its host for; of an interlaced one each field.
+double FramesToAnalyse(const host::LayerState& layer) {
+  return layer.length * (layer.field_type == HX_FIELD_PROGRESSIVE ? 1.0 : 2.0);
 }
 
 std::string FailureText(int status, const std::vector<std::string>& messages) {
@@ -165,8 +155,10 @@ SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
 void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
   using Work = host::Session::Work;
   Progress shown;
+  std::uint64_t delivered_before = 0;  // the analysis, which alone asks for frames here
   const auto show = [&] {
     const Work work = host::Session::WorkOf(*effect_);
+    const std::uint64_t delivered = host_.media().counts().delivered;
     if (IsBroken()) return true;  // in this order: what it ends for that reason is not told
     const std::string stage = work == Work::analysing ? "analyzing"
                               : work == Work::solving ? "solving"
@@ -180,9 +172,14 @@ void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
     if (!stage.empty()) {
       reuse.framing = false;
       if (work == Work::analysing) reuse.analysis = false;
+      if (work == Work::analysing) {
+        if (stage != shown.stage) delivered_before = delivered;
+        shown.unit = "frames";
+        shown.total = FramesToAnalyse(*effect_->shared()->layer()->state());
+        shown.done = std::min(static_cast<double>(delivered - delivered_before), shown.total);
+      }
       shown.stage = stage;
       shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
-      if (ParseFrames(shown.says, &shown.done, &shown.total)) shown.unit = "frames";
       if (shown.says.find('(') == std::string::npos) shown.says.clear();  // the bare name
       progress.Show(shown);
     }

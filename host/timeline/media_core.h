@@ -1,6 +1,8 @@
 #pragma once
 
+#include <atomic>
 #include <boost/shared_ptr.hpp>
+#include <cstdint>
 #include <map>
 #include <mutex>
 #include <new>
@@ -41,6 +43,7 @@ class MediaCore {
   HandleTable<HX_Segments, boost::shared_ptr<const LayerState>> segments;
   HandleTable<HX_Frame, PicturePtr> frames;
   StringTable strings;
+  std::atomic<std::uint64_t> delivered{0};  // see MediaCounts
 
  private:
   mutable std::mutex mutex_;

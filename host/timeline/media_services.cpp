@@ -125,6 +125,7 @@ MediaCounts MediaServices::counts() const {
   counts.references = core_->cache.references();
   counts.requests = core_->queue.outstanding();
   counts.cached_bytes = core_->cache.bytes();
+  counts.delivered = core_->delivered;
   return counts;
 }
 

@@ -44,6 +44,7 @@ struct MediaCounts {
   std::size_t references = 0;  // to identifiers of the frame cache
   std::size_t requests = 0;    // renders whose callback has not returned
   std::size_t cached_bytes = 0;
+  std::uint64_t delivered = 0;  // frames that such renders ended with so far, lent or not
 };
 
 // A frame for a render of the host.

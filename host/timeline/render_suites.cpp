@@ -33,7 +33,9 @@ HX_Frame MakeFrame(Core& core, const FrameRequest& request) noexcept {
     if (core.faults.null_frame) return 0;
     const FrameLayout layout{core.faults.row_padding, !core.faults.bottom_up};
     const PicturePtr picture = core.maker.Get(request, layout);
-    return picture ? core.frames.Add(picture) : 0;
+    if (!picture) return 0;
+    ++core.delivered;
+    return core.frames.Add(picture);
   } catch (const std::exception&) {
     return 0;
   }

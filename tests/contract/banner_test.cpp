@@ -1,20 +1,19 @@
+#include <gmock/gmock.h>
+
 #include <algorithm>
 #include <array>
 #include <cmath>
-#include <functional>
 #include <optional>
 #include <string>
-#include <vector>
 
-#include "tests/contract/held_work.h"
 #include "tests/contract/played_plugin.h"
+#include "tests/support/held_work.h"
 
 // What frames say about their status, by the banner that a user sees.
 
 namespace calmframe::host {
 namespace {
 
-using namespace std::chrono_literals;
 using Colour = std::array<double, 3>;
 
 constexpr Colour kBlue{0.00784, 0.25098, 1.0}, kOrange{0.8, 0.33333, 0.0}, kRed{0.77255, 0.0, 0.0};
@@ -48,8 +47,7 @@ class Banner : public PlayedPlugin {
         SCOPED_TRACE("1/" + std::to_string(den) + " at " + std::to_string(depth));
         const auto render = [&](bool hidden) {
           effect.SetParam(kHideBanner, hidden);
-          const RenderRequest request{kShown, std::abs(depth), {1, den}};
-          return Float(depth < 0 ? renderer->Direct(request) : renderer->Planned(request));
+          return Float(Render(*renderer, depth < 0, {kShown, std::abs(depth), {1, den}}));
         };
         const auto shown = render(false), beneath = render(true);
         ASSERT_TRUE(shown && beneath);
@@ -124,7 +122,7 @@ TEST_F(Banner, WorkThatIsUnderWayIsStriped) {
   EXPECT_EQ(Session::StatusOf(effect), 5);
   ExpectBanner(effect, Look{kOrange, true});
   solving.Release();
-  EXPECT_EQ(Settle(effect), 8);
+  EXPECT_EQ(Settle(effect), kReady);
   ExpectBanner(effect, {});
 
   Hold again;
@@ -134,33 +132,26 @@ TEST_F(Banner, WorkThatIsUnderWayIsStriped) {
   EXPECT_EQ(Session::StatusOf(effect), 6);
   ExpectBanner(effect, Look{kOrange, true});
   again.Release();
-  EXPECT_EQ(Settle(effect), 8);
+  EXPECT_EQ(Settle(effect), kReady);
 }
 
 TEST_F(Banner, WhatWantsTheUsersAnalyzeIsFlat) {
   const auto layer = MakeLayer({320, 240, 26, "flat banners"});
-  const auto place = [&](std::int32_t start, std::int32_t length) {
-    layer->Change([=](LayerState& state) {
-      state.start_frame = start;
-      state.length = length;
-    });
-    session().Tick();
-  };
-  place(0, 16);
+  Trim(*layer, 0, 16);
   Effect& effect = session().Apply(layer);
   ASSERT_TRUE(effect.Press(kCancel).ok());
   ASSERT_EQ(Settle(effect), 1);
   ExpectBanner(effect, Look{kBlue, false});  // nothing is analysed
   ASSERT_TRUE(effect.Press(kAnalyze).ok());
-  ASSERT_EQ(Settle(effect), 8);
-  place(0, 12);
+  ASSERT_EQ(Settle(effect), kReady);
+  Trim(*layer, 0, 12);
   ExpectBanner(effect, {});  // a part of what was analysed
-  place(0, 26);
+  Trim(*layer, 0, 26);
   ExpectBanner(effect, Look{kBlue, false, true});  // the range has changed
-  place(4, 16);
+  Trim(*layer, 4, 16);
   ASSERT_TRUE(effect.Press(kAnalyze).ok());
-  ASSERT_EQ(Settle(effect), 8);
-  place(0, 16);
+  ASSERT_EQ(Settle(effect), kReady);
+  Trim(*layer, 0, 16);
   ExpectBanner(effect, Look{kBlue, false});  // outside of the range
 }
 
@@ -170,14 +161,12 @@ TEST_F(Banner, FailuresAreRed) {
     host().media().faults.null_frame = true;
     ASSERT_EQ(Settle(effect), 1);
     host().media().faults.null_frame = false;
-    const std::vector<std::string> messages = effect.TakeMessages();
-    ASSERT_FALSE(messages.empty());
-    for (const std::string& message : messages) {
-      EXPECT_EQ(message, "Error receiving synchronous frame.");
-    }
+    const auto messages = effect.TakeMessages();
+    EXPECT_THAT(messages, testing::Each("Error receiving synchronous frame."));
+    EXPECT_FALSE(messages.empty());
     ExpectBanner(effect, Look{kRed, false});  // the analysis failed
     EXPECT_TRUE(effect.Press(kAnalyze).ok());
-    EXPECT_EQ(Settle(effect), 8);
+    EXPECT_EQ(Settle(effect), kReady);
     ExpectBanner(effect, {});
     session().Remove(effect);
   }
@@ -191,17 +180,21 @@ TEST_F(Banner, FailuresAreRed) {
     EXPECT_EQ(Settle(effect), 10);  // it is not tried again
     stages.FailAt("");
     effect.SetParam(kSmoothness, 49);
-    EXPECT_EQ(Settle(effect), 8);
+    EXPECT_EQ(Settle(effect), kReady);
     ExpectBanner(effect, {});
     session().Remove(effect);
   }
   {
     const auto layer = MakeLayer({320, 240, 16, "refused"});
     Effect& effect = session().Apply(layer);
-    ASSERT_EQ(Settle(effect), 8);
-    layer->Change([](LayerState& state) { state.refusal = "Not this layer."; });
+    ASSERT_EQ(Settle(effect), kReady);
+    Refuse(*layer, "Not this layer.");
     ExpectBanner(effect, Look{kRed, false});
-    layer->Change([](LayerState& state) { state.refusal.clear(); });
+    session().Tick();
+    EXPECT_TRUE(Enabled(effect, kAnalyze));
+    effect.Press(kAnalyze);
+    EXPECT_THAT(effect.TakeMessages(), testing::ElementsAre(testing::HasSubstr("Not this layer.")));
+    Refuse(*layer, "");
     ExpectBanner(effect, {});
     session().Remove(effect);
   }
@@ -210,10 +203,10 @@ TEST_F(Banner, FailuresAreRed) {
     clip.tremor = 9;
     Effect& effect = session().Apply(MakeLayer(clip));
     effect.SetParam(kFraming, 2);
-    ASSERT_EQ(Settle(effect), 8);
+    ASSERT_EQ(Settle(effect), kReady);
     ExpectBanner(effect, Look{kRed, false, true});  // over-cropped
     effect.SetParam(kFraming, 1);
-    ASSERT_EQ(Settle(effect), 8);
+    ASSERT_EQ(Settle(effect), kReady);
     ExpectBanner(effect, {});
   }
 }

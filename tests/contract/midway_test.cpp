@@ -3,8 +3,8 @@
 #include <string>
 #include <vector>
 
-#include "tests/contract/held_work.h"
 #include "tests/contract/played_plugin.h"
+#include "tests/support/held_work.h"
 
 // What a user does in the middle of everything: the same at each of these places of an effect's
 // way from its making to its settled frames.
@@ -12,7 +12,6 @@
 namespace calmframe::host {
 namespace {
 
-using namespace std::chrono_literals;
 using Work = Session::Work;
 
 constexpr std::int64_t kFrames = 8;
@@ -65,16 +64,14 @@ class Midway : public PlayedPlugin {
         for (int i = 0; i < place.ticks; ++i) session().Tick();
         release = hold.ReleaseSoon();
       } else if (place.work == Work::none) {
-        ASSERT_EQ(Settle(effect), 8);
+        ASSERT_EQ(Settle(effect), kReady);
       }
       action(place, effect);
       release.reset();
       while (!session().effects().empty()) session().Remove(*session().effects().back());
       // Renders of the clip may be under way, and they hold on to `hold`.
       while (host().media().counts().requests > 0) std::this_thread::sleep_for(1ms);
-      EXPECT_EQ(host().handles().count(), 1u);  // the plug-in's global data
-      EXPECT_EQ(host().opaque_data().uses(), 0u);
-      EXPECT_EQ(Ledger::Get().mistakes(), std::vector<std::string>());
+      ExpectNothingHeld();
       if (HasFailure()) return;
     }
   }
@@ -88,16 +85,10 @@ class Midway : public PlayedPlugin {
     while (host().media().counts().references > 0) std::this_thread::sleep_for(1ms);
   }
 
-  // Whatever was done to it, the effect can be brought to steadied frames by its button.
   void ExpectUsable(Effect& effect) {
-    Settle(effect);
-    if (Enabled(effect, kAnalyze)) {
-      EXPECT_TRUE(effect.Press(kAnalyze).ok());
-    }
-    EXPECT_EQ(Settle(effect), 8);
+    Bring(effect);
     EXPECT_FALSE(Enabled(effect, kAnalyze));
     EXPECT_FALSE(Enabled(effect, kCancel));
-    EXPECT_TRUE(effect.MakeRenderer()->Planned({3}).pixels);
     EXPECT_TRUE(effect.TakeMessages().empty());
   }
 
@@ -119,7 +110,7 @@ TEST_F(Midway, AnAnalysisIsCancelledAndASolveIsNot) {
       EXPECT_EQ(Settle(effect), 1);
       EXPECT_EQ(stages().Take(), "");
     } else {
-      EXPECT_EQ(Settle(effect), 8);
+      EXPECT_EQ(Settle(effect), kReady);
     }
     ExpectUsable(effect);
   });
@@ -148,7 +139,7 @@ TEST_F(Midway, DetailedAnalysisStartsAgain) {
   AtEachPlace([this](const Place&, Effect& effect) {
     EXPECT_TRUE(effect.SetParam(kDetailedAnalysis, 1).ok());
     EXPECT_EQ(Session::WorkOf(effect), Work::analysing);
-    EXPECT_EQ(Settle(effect), 8);
+    EXPECT_EQ(Settle(effect), kReady);
     ExpectUsable(effect);
   });
 }
@@ -157,13 +148,12 @@ TEST_F(Midway, WhatIsSolvedIsWhatTheControlsSayAtTheEnd) {
   AtEachPlace([this](const Place&, Effect& effect) {
     effect.SetParam(kSmoothness, 80);
     effect.SetParam(kFraming, 1);
-    EXPECT_EQ(Settle(effect), 8);
+    EXPECT_EQ(Settle(effect), kReady);
     EXPECT_NE(stages().Take(), "");
     const auto frame = effect.MakeRenderer()->Planned({3}).OnLayer();
-    Effect& fresh =
-        session().Load(MakeLayer({96, 64, kFrames, "fresh"}),
-                       {"KLPX SubspaceStabilizer", effect.shared()->params().Values(), {}});
-    EXPECT_EQ(Settle(fresh), 8);
+    Effect& fresh = session().Load(MakeLayer({96, 64, kFrames, "fresh"}),
+                                   {kMatchName, effect.shared()->params().Values(), {}});
+    EXPECT_EQ(Settle(fresh), kReady);
     EXPECT_EQ(Difference(*frame, *fresh.MakeRenderer()->Planned({3}).OnLayer()), 0);
     ExpectUsable(effect);
   });
@@ -171,10 +161,7 @@ TEST_F(Midway, WhatIsSolvedIsWhatTheControlsSayAtTheEnd) {
 
 TEST_F(Midway, AnEffectBeneathOffersAnalyzeOnceTheWorkIsDone) {
   AtEachPlace([this](const Place& place, Effect& effect) {
-    EffectOperator other;
-    other.runtime_id = NewRuntimeId();
-    other.match_name = "Other";
-    layer().InsertEffect(0, other);
+    layer().InsertEffect(0, OtherEffect());
     Settle(effect);
     session().Tick();
     // The first tick alone asks what stands beneath.
@@ -186,13 +173,10 @@ TEST_F(Midway, AnEffectBeneathOffersAnalyzeOnceTheWorkIsDone) {
 
 TEST_F(Midway, ARefusalHealsWithItsCause) {
   AtEachPlace([this](const Place&, Effect& effect) {
-    const auto refuse = [this](const char* why) {
-      layer().Change([why](LayerState& state) { state.refusal = why; });
-    };
-    refuse("Not this layer.");
+    Refuse(layer(), "Not this layer.");
     for (int i = 0; i < 3; ++i) session().Tick();
     EXPECT_TRUE(effect.MakeRenderer()->Planned({3}).pixels);
-    refuse("");
+    Refuse(layer(), "");
     session().Tick();
     effect.TakeMessages();
     ExpectUsable(effect);
@@ -215,7 +199,7 @@ TEST_F(Midway, BackgroundWorkRestsWhileTheHostPauses) {
 TEST_F(Midway, ATrimmedLayerOffersAnalyzeAndNeedsNone) {
   AtEachPlace([this](const Place&, Effect& effect) {
     layer().Change([](LayerState& state) { state.length = kFrames - 2; });
-    EXPECT_EQ(Settle(effect), 8);
+    EXPECT_EQ(Settle(effect), kReady);
     session().Tick();
     EXPECT_TRUE(Enabled(effect, kAnalyze));
     ExpectUsable(effect);

@@ -4,34 +4,27 @@
 
 #include <boost/make_shared.hpp>
 #include <chrono>
+#include <map>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "host/base/operations.h"
 #include "host/effects/session.h"
-#include "host/pixels/world_operations.h"
-#include "tests/contract/shaky_clip.h"
+#include "tests/support/controls.h"
+#include "tests/support/frame_difference.h"
+#include "tests/support/shaky_clip.h"
 
 namespace calmframe::host {
 
-// Indices of the plug-in's controls.
-enum : std::int32_t {
-  kAnalyze = 1,
-  kCancel = 2,
-  kGroup = 3,
-  kSmoothness = 5,
-  kMethod = 6,
-  kFraming = 9,
-  kAutoScale = 10,
-  kMaximumScale = 11,
-  kDetailedAnalysis = 17,
-  kCropLessSmoothMore = 19,
-  kHideBanner = 28
-};
+using namespace std::chrono_literals;
 
 // The real plug-in in a host of its own; whatever a test leaves behind or does wrong fails it.
 class PlayedPlugin : public testing::Test {
  protected:
+  static constexpr char kMatchName[] = "KLPX SubspaceStabilizer";
+  static constexpr int kReady = 8;  // of the last two digits of the status
+
   PlayedPlugin()
       : host_(std::make_unique<Host>(CALMFRAME_PLUGIN, Settings())),
         session_(std::make_unique<Session>(*host_)) {
@@ -46,25 +39,84 @@ class PlayedPlugin : public testing::Test {
     EXPECT_EQ(host_->LeakReport(), "");
   }
 
+  // A cache that the clips of a tour outgrow.
+  static HostSettings Settings() {
+    HostSettings settings;
+    settings.media.cache_bytes = std::size_t{16} << 20;
+    return settings;
+  }
+
   static boost::shared_ptr<Layer> MakeLayer(const ShakyClip& clip = {}) {
     return boost::make_shared<Layer>(MakeShakyClip(clip));
   }
 
   // Status once nothing is under way any more.
   int Settle(const Effect& effect) {
-    EXPECT_EQ(session_->TickUntilSettled(std::chrono::minutes(5)), Session::Wait::settled);
+    EXPECT_EQ(session_->TickUntilSettled(5min), Session::Wait::settled);
     return Session::StatusOf(effect);
+  }
+
+  // An effect on the clip whose work is done: by the first of a process, whose saved work the
+  // others take up. Clips are told apart by their names.
+  Effect& Steady(const ShakyClip& clip = {}) {
+    static std::map<std::string, SavedEffect> done;
+    SavedEffect& saved = done[clip.name];
+    const bool first = saved.instance.empty();
+    Effect& effect =
+        first ? session_->Apply(MakeLayer(clip)) : session_->Load(MakeLayer(clip), saved);
+    EXPECT_EQ(Settle(effect), kReady);
+    if (first) {
+      EXPECT_TRUE(effect.Save(&saved).ok());
+    }
+    return effect;
+  }
+
+  // Whatever was done to it, the effect comes to steadied frames by its button. `patience`: for
+  // work that a host takes to be under way for ever, since its status could not be told.
+  void Bring(Effect& effect, std::chrono::milliseconds patience = 5min) {
+    session_->TickUntilSettled(patience);
+    if (Enabled(effect, kAnalyze)) {
+      EXPECT_TRUE(effect.Press(kAnalyze).ok());
+    }
+    EXPECT_EQ(Settle(effect), kReady);
+    EXPECT_TRUE(effect.MakeRenderer()->Planned({3}).pixels);
+  }
+
+  // Of effects that are gone. A job whose effect went in the middle may hold suites yet.
+  void ExpectNothingHeld() {
+    EXPECT_EQ(host_->handles().count(), 1u);  // the plug-in's global data
+    EXPECT_EQ(host_->worlds().count(), 0u);
+    EXPECT_EQ(host_->opaque_data().uses(), 0u);
+    EXPECT_EQ(Ledger::Get().mistakes(), std::vector<std::string>());
   }
 
   static bool Enabled(const Effect& effect, std::int32_t index) {
     return !(effect.Param(index)->ui_flags & HX_PARAM_UI_DISABLED);
   }
 
-  // A cache that the clips of a tour outgrow.
-  static HostSettings Settings() {
-    HostSettings settings;
-    settings.media.cache_bytes = std::size_t{16} << 20;
-    return settings;
+  // What the layer shows of the source, as the effect comes to know it.
+  void Trim(Layer& layer, std::int32_t start, std::int32_t length) {
+    layer.Change([=](LayerState& state) {
+      state.start_frame = start;
+      state.length = length;
+    });
+    session_->Tick();
+  }
+  static void Refuse(Layer& layer, const std::string& why) {
+    layer.Change([&](LayerState& state) { state.refusal = why; });
+  }
+  static EffectOperator OtherEffect() {
+    EffectOperator other;
+    other.runtime_id = NewRuntimeId();
+    other.match_name = "Other";
+    return other;
+  }
+
+  // Frames that analyses got so far.
+  std::uint64_t Analysed() const { return host_->media().counts().delivered; }
+
+  static RenderedFrame Render(Renderer& renderer, bool direct, const RenderRequest& request) {
+    return direct ? renderer.Direct(request) : renderer.Planned(request);
   }
 
   Host& host() { return *host_; }
@@ -74,36 +126,5 @@ class PlayedPlugin : public testing::Test {
   std::unique_ptr<Host> host_;
   std::unique_ptr<Session> session_;
 };
-
-// Mean absolute difference of two frames' colours, in 255ths, over all but a margin of `margin`
-// pixels; both at one size.
-inline double Difference(const WorldBuffer& a, const WorldBuffer& b, int margin = 0) {
-  const HX_World &first = a.world(), &second = b.world();
-  EXPECT_EQ(first.width, second.width);
-  EXPECT_EQ(first.height, second.height);
-  WorldBuffer x(first.width, first.height, HX_FORMAT_ARGBF),
-      y(first.width, first.height, HX_FORMAT_ARGBF);
-  CopyWorld(first, x.world(), nullptr, nullptr);
-  CopyWorld(second, y.world(), nullptr, nullptr);
-  double sum = 0;
-  int count = 0;
-  for (int row = margin; row < first.height - margin; ++row) {
-    for (int column = margin; column < first.width - margin; ++column, count += 3) {
-      for (int c = 1; c < 4; ++c) {
-        sum += std::abs(x.row<float>(row)[column * 4 + c] - y.row<float>(row)[column * 4 + c]);
-      }
-    }
-  }
-  return sum * 255 / count;
-}
-
-// The source's frame as the host hands it in.
-inline std::shared_ptr<WorldBuffer> SourceFrame(Effect& effect, std::int64_t frame) {
-  const PicturePtr picture =
-      effect.shared()->layer()->state()->source->Fetch(frame, PixelKind::argb8);
-  auto copy = std::make_shared<WorldBuffer>(picture->width(), picture->height(), HX_FORMAT_ARGB8);
-  CopyWorld(WorldOf(*picture), copy->world(), nullptr, nullptr);
-  return copy;
-}
 
 }  // namespace calmframe::host

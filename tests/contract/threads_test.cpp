@@ -1,17 +1,17 @@
 #include <malloc.h>
 
 #include <algorithm>
+#include <array>
 #include <atomic>
-#include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <random>
 #include <shared_mutex>
 #include <string>
 #include <thread>
-#include <utility>
 #include <vector>
 
 #include "platform/tessel/threads.h"
@@ -20,17 +20,35 @@
 namespace calmframe::host {
 namespace {
 
-using namespace std::chrono_literals;
-
 constexpr std::int64_t kFrames = 30, kMostStart = 4;
 constexpr std::size_t kMostEffects = 4;
+const ShakyClip kClips[] = {{160, 120, kFrames, "played with"}, {128, 96, kFrames, "and another"}};
+
+int Setting(const char* name, int unless_set) {
+  const char* const text = std::getenv(name);
+  return text ? std::atoi(text) : unless_set;
+}
 
 class TourThreads : public PlayedPlugin {
  protected:
-  // Of a test run; the environment may want more.
-  static std::chrono::seconds Length() {
-    const char* const seconds = std::getenv("CALMFRAME_STRESS_SECONDS");
-    return std::chrono::seconds(seconds ? std::atoi(seconds) : 5);
+  // A user acts on effects, at first one on each of both layers, while other threads render them
+  // and read their exports: until `enough`, asked before each act.
+  void Storm(std::mt19937& random, const std::function<bool()>& enough) {
+    layers_ = {MakeLayer(kClips[0]), MakeLayer(kClips[1])};
+    for (const auto& layer : layers_) Keep(session().Apply(layer));
+    ends_ = false;
+    std::vector<std::jthread> threads;
+    for (int t = 0; t < 4; ++t) {
+      threads.emplace_back([this, seed = static_cast<unsigned>(random())] { RenderOn(seed); });
+    }
+    threads.emplace_back([this] { ReadExportsOn(99); });
+    while (!enough() && !HasFailure()) Act(random);
+    Drop(*session().effects().back());  // in the middle of whatever goes on
+    ends_ = true;
+    threads.clear();
+    SwitchFaultsOff();
+    Session::PauseBackgroundWork(false);
+    for (const auto& layer : layers_) Refuse(*layer, "");
   }
 
   // What render threads choose from. They make their renderers while the effect stands; then they
@@ -54,13 +72,13 @@ class TourThreads : public PlayedPlugin {
         request.bit_depth = 8 << random() % (direct ? 2 : 3);
         request.downsample.den = 1 + random() % 2;
         if (random() % 4 == 0) request.part = HX_Rect{10, 10, 50, 40};
-        const RenderedFrame frame = direct ? renderer->Direct(request) : renderer->Planned(request);
+        const RenderedFrame frame = Render(*renderer, direct, request);
         ++rendered_;
         if (frame.pixels) continue;
         // The frames of one that was taken off its layer have no source any more.
         const std::shared_lock lock(mutex_);
         if (std::count(standing_.begin(), standing_.end(), effect) == 0) break;
-        if (!faults_) Fail(frame.result.Line(direct ? "direct" : "planned"));
+        if (!faults_ && failed_++ == 0) ADD_FAILURE() << frame.result.Line("a render");
       }
     }
   }
@@ -83,10 +101,6 @@ class TourThreads : public PlayedPlugin {
     }
   }
 
-  void Fail(const std::string& why) {
-    if (failed_++ == 0) ADD_FAILURE() << why;
-  }
-
   void Keep(Effect& effect) {
     ++instances_;
     const std::lock_guard lock(mutex_);
@@ -98,56 +112,37 @@ class TourThreads : public PlayedPlugin {
     session().Remove(effect);
   }
 
+  std::array<std::atomic<bool>*, 6> Switches() {
+    MediaFaults& media = host().media().faults;
+    return {&media.null_frame,        &media.early_callback,   &media.render_refused,
+            &media.identifier_failed, &media.property_missing, &media.node_missing};
+  }
   // Something of the host goes wrong from now on, or nothing does.
   void SwitchFaults(std::mt19937& random) {
-    MediaFaults& media = host().media().faults;
-    switch (random() % 12) {
-      case 0:
-        return Operations::Get().FailNth(1 + random() % 200);
-      case 1:
-        media.null_frame = true;
-        return;
-      case 2:
-        media.early_callback = true;
-        return;
-      case 3:
-        media.late_callback_ms = 20;
-        return;
-      case 4:
-        media.render_refused = true;
-        return;
-      case 5:
-        media.identifier_failed = true;
-        return;
-      case 6:
-        media.property_missing = true;
-        return;
-      case 7:
-        media.node_missing = true;
-        return;
-      default:
-        return SwitchFaultsOff();
+    const unsigned which = random() % 12;
+    if (which < Switches().size()) {
+      *Switches()[which] = true;
+    } else if (which == 6) {
+      host().media().faults.late_callback_ms = 20;
+    } else if (which == 7) {
+      Operations::Get().FailNth(1 + random() % 200);
+    } else {
+      SwitchFaultsOff();
     }
   }
   void SwitchFaultsOff() {
     Operations::Get().FailNone();
-    MediaFaults& media = host().media().faults;
-    for (std::atomic<bool>* fault :
-         {&media.null_frame, &media.early_callback, &media.render_refused, &media.identifier_failed,
-          &media.property_missing, &media.node_missing}) {
-      *fault = false;
-    }
-    media.late_callback_ms = 0;
+    for (std::atomic<bool>* fault : Switches()) *fault = false;
+    host().media().faults.late_callback_ms = 0;
   }
 
   // One thing that a user may do.
-  void Act(std::mt19937& random, const std::vector<boost::shared_ptr<Layer>>& layers) {
-    ++acts_;
-    if (faults_ && random() % 8 == 0) SwitchFaults(random);
+  void Act(std::mt19937& random) {
     const auto& effects = session().effects();
-    const boost::shared_ptr<Layer>& layer = layers[random() % layers.size()];
+    const boost::shared_ptr<Layer>& layer = layers_[random() % layers_.size()];
     Effect& effect = *effects[random() % effects.size()];
     const bool room = effects.size() < kMostEffects;
+    if (faults_ && random() % 8 == 0) SwitchFaults(random);
     switch (random() % 19) {
       case 0:
       case 1:
@@ -175,7 +170,7 @@ class TourThreads : public PlayedPlugin {
         });
         break;
       case 8:
-        layer->Change([&](LayerState& state) { state.refusal = random() % 2 ? "" : "Not now."; });
+        Refuse(*layer, random() % 2 ? "" : "Not now.");
         break;
       case 9:
         if (room) Keep(session().Apply(layer));
@@ -189,43 +184,27 @@ class TourThreads : public PlayedPlugin {
       case 12:
         if (effects.size() > 1) Drop(effect);
         break;
-      default:
+      default:  // as a host's loop does
         session().Tick();
-        std::this_thread::sleep_for(2ms);
-    }
-  }
-
-  // What a user does about effects that something went wrong with.
-  void Rouse() {
-    for (const auto& effect : session().effects()) {
-      effect->SetParam(kSmoothness, 29);  // a solve that failed is tried again
-    }
-    session().TickUntilSettled(2000ms);  // a status that could not be told keeps a host waiting
-    for (const auto& effect : session().effects()) {
-      if (Enabled(*effect, kAnalyze)) {
-        EXPECT_TRUE(effect->Press(kAnalyze).ok());
-      }
+        host().WaitForWake(2ms);
     }
   }
 
   // The frames of an effect whose tracks are rounded, as they are in a saved one, anew solved.
   std::vector<std::shared_ptr<WorldBuffer>> FramesOf(Effect& effect) {
-    effect.SetParam(kSmoothness, 30);
-    Settle(effect);
-    if (Enabled(effect, kAnalyze)) {  // what was under way was of another range
-      EXPECT_TRUE(effect.Press(kAnalyze).ok());
-    }
-    EXPECT_EQ(Settle(effect), 8);
+    effect.SetParam(kSmoothness, 30);  // a solve that failed is tried again with other controls
+    Bring(effect, 2s);
     SavedEffect saved;
     EXPECT_TRUE(effect.Save(&saved).ok());
     effect.SetParam(kSmoothness, 31);
-    EXPECT_EQ(Settle(effect), 8);
+    EXPECT_EQ(Settle(effect), kReady);
     const auto renderer = effect.MakeRenderer();
     return {renderer->Planned({7, 16}).OnLayer(), renderer->Direct({8}).OnLayer()};
   }
 
+  std::vector<boost::shared_ptr<Layer>> layers_;
   std::atomic<bool> ends_{false};
-  std::atomic<int> rendered_{0}, failed_{0}, acts_{0};
+  std::atomic<int> rendered_{0}, failed_{0};
   bool faults_ = false;  // constant while there are threads
   int instances_ = 0;    // that were made
 
@@ -238,86 +217,32 @@ class TourThreads : public PlayedPlugin {
 // Whatever the user does to effects meanwhile, renders get a frame each time; and in the end each
 // of the effects can be brought to steadied frames.
 TEST_F(TourThreads, RendersGoOnWhileEffectsArePlayedWith) {
-  const std::vector<boost::shared_ptr<Layer>> layers = {
-      MakeLayer({160, 120, kFrames, "played with"}), MakeLayer({128, 96, kFrames, "and another"})};
-  for (const auto& layer : layers) Keep(session().Apply(layer));
-  std::vector<std::jthread> threads;
-  for (unsigned t = 0; t < 4; ++t) threads.emplace_back([this, t] { RenderOn(t); });
-  threads.emplace_back([this] { ReadExportsOn(99); });
   std::mt19937 random(7);
-  const auto end = std::chrono::steady_clock::now() + Length();
-  while (std::chrono::steady_clock::now() < end && !HasFailure()) Act(random, layers);
-  // In the middle of whatever goes on.
-  Drop(*session().effects().back());
-  ends_ = true;
-  threads.clear();
+  int acts = Setting("CALMFRAME_STRESS_ACTS", 600);
+  Storm(random, [&] { return acts-- == 0; });
   EXPECT_GT(rendered_, 0);
-  Session::PauseBackgroundWork(false);
-  for (const auto& layer : layers) {
-    layer->Change([](LayerState& state) { state.refusal.clear(); });
-  }
-  for (const auto& effect : session().effects()) {
-    Settle(*effect);
-    if (Enabled(*effect, kAnalyze)) {
-      EXPECT_TRUE(effect->Press(kAnalyze).ok());
-    }
-    EXPECT_EQ(Settle(*effect), 8);
-  }
+  for (const auto& effect : session().effects()) Bring(*effect);
 }
 
 // Effects come and go at random while faults do, until so many were made; then nothing is left of
 // those that went, memory has not grown since a quarter of them, and those that stand give the very
 // frames of one that was left alone.
 TEST_F(TourThreads, ASoakLosesNothingAndLeavesNothing) {
-  const auto setting = [](const char* name, int unless_set) {
-    const char* const text = std::getenv(name);
-    return text ? std::atoi(text) : unless_set;
-  };
-  const int wanted = setting("CALMFRAME_SOAK_INSTANCES", 20);
-  std::mt19937 random(static_cast<unsigned>(setting("CALMFRAME_SEED", 1)));
+  const int wanted = Setting("CALMFRAME_SOAK_INSTANCES", 20);
+  std::mt19937 random(static_cast<unsigned>(Setting("CALMFRAME_SEED", 1)));
   faults_ = true;
-  std::jthread watchdog([this](std::stop_token stop) {
-    for (int last = -1, waits = 0; !stop.stop_requested(); std::this_thread::sleep_for(100ms)) {
-      waits = std::exchange(last, acts_.load()) == acts_ ? waits + 1 : 0;
-      if (waits < 3000) continue;
-      std::fprintf(stderr, "nothing has moved for five minutes\n");
-      std::abort();
-    }
-  });
-  const ShakyClip clips[] = {{160, 120, kFrames, "soaked"}, {128, 96, kFrames, "soaked too"}};
   std::size_t held_early = 0;
   for (int quarter = 1; quarter <= 4; ++quarter) {
-    const std::vector<boost::shared_ptr<Layer>> layers = {MakeLayer(clips[0]), MakeLayer(clips[1])};
-    for (const auto& layer : layers) Keep(session().Apply(layer));
-    ends_ = false;
-    {
-      std::vector<std::jthread> threads;
-      for (unsigned t = 0; t < 3; ++t) {
-        threads.emplace_back([this, seed = static_cast<unsigned>(random())] { RenderOn(seed); });
-      }
-      threads.emplace_back([this] { ReadExportsOn(99); });
-      while (4 * instances_ < quarter * wanted && !HasFailure()) Act(random, layers);
-      ends_ = true;
-    }
-    SwitchFaultsOff();
-    Session::PauseBackgroundWork(false);
-    for (const auto& layer : layers) {
-      layer->Change([](LayerState& state) {
-        state.refusal.clear();
-        state.start_frame = 0;
-        state.length = static_cast<std::int32_t>(kFrames);
-      });
-    }
-    Rouse();
+    Storm(random, [&] { return 4 * instances_ >= quarter * wanted; });
+    for (const auto& layer : layers_) Trim(*layer, 0, kFrames);
     std::vector<Effect*> survivors;
     for (const auto& effect : session().effects()) survivors.push_back(effect.get());
     for (Effect* effect : survivors) {
       SCOPED_TRACE("instance " + std::to_string(instances_));
       const auto frames = FramesOf(*effect);
-      const bool first = effect->shared()->layer() == layers[0];
-      Effect& fresh =
-          session().Load(MakeLayer(clips[first ? 0 : 1]),
-                         {"KLPX SubspaceStabilizer", effect->shared()->params().Values(), {}});
+      const bool first = effect->shared()->layer() == layers_[0];
+      Effect& fresh = session().Load(MakeLayer(kClips[first ? 0 : 1]),
+                                     {kMatchName, effect->shared()->params().Values(), {}});
       const auto undisturbed = FramesOf(fresh);
       for (std::size_t i = 0; i < frames.size(); ++i) {
         EXPECT_EQ(Difference(*frames[i], *undisturbed[i]), 0);
@@ -325,12 +250,8 @@ TEST_F(TourThreads, ASoakLosesNothingAndLeavesNothing) {
       session().Remove(fresh);
     }
     while (!session().effects().empty()) Drop(*session().effects().back());
-    tessel::threads::Shutdown();              // jobs that wait for joiners
-    EXPECT_EQ(host().handles().count(), 1u);  // the plug-in's global data
-    EXPECT_EQ(host().worlds().count(), 0u);
-    EXPECT_EQ(host().opaque_data().uses(), 0u);
-    // A job whose effect went while it was saved may hold suites until the plug-in is stopped.
-    EXPECT_EQ(Ledger::Get().mistakes(), std::vector<std::string>());
+    tessel::threads::Shutdown();  // jobs that wait for joiners
+    ExpectNothingHeld();
     host().media().SetCacheBytes(0);
     host().media().SetCacheBytes(Settings().media.cache_bytes);
     malloc_trim(0);

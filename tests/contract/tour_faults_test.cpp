@@ -10,8 +10,6 @@
 namespace calmframe::host {
 namespace {
 
-using namespace std::chrono_literals;
-
 // A status that could not be told keeps a host waiting.
 constexpr auto kPatience = 1000ms;
 
@@ -53,17 +51,9 @@ class TourFaults : public PlayedPlugin {
   // With the fault gone the effect works as if nothing had been.
   void Recover() {
     Operations::Get().FailNone();
-    session().TickUntilSettled(kPatience);
-    if (Enabled(*faulty_, kAnalyze)) {
-      EXPECT_TRUE(faulty_->Press(kAnalyze).ok());
-    }
-    EXPECT_EQ(Settle(*faulty_), 8);
-    EXPECT_TRUE(faulty_->MakeRenderer()->Planned({3}).pixels);
+    Bring(*faulty_, kPatience);
     session().Remove(*faulty_);
-    EXPECT_EQ(Ledger::Get().mistakes(), std::vector<std::string>());  // a job may hold suites yet
-    EXPECT_EQ(host().handles().count(), 1u);                          // the plug-in's global data
-    EXPECT_EQ(host().worlds().count(), 0u);
-    EXPECT_EQ(host().opaque_data().uses(), 0u);
+    ExpectNothingHeld();
   }
 
   Effect* faulty_ = nullptr;
@@ -93,7 +83,7 @@ TEST_F(TourFaults, AStatusThatCouldNotBeToldIsToldWithTheNextTick) {
   EXPECT_TRUE(effect.Tick().ok());
   EXPECT_EQ(Session::StatusOf(effect), 4);
   Session::PauseBackgroundWork(false);
-  EXPECT_EQ(Settle(effect), 8);
+  EXPECT_EQ(Settle(effect), kReady);
   // One that was told of and can't begin is over.
   EXPECT_TRUE(effect.SetParam(kDetailedAnalysis, 1).ok());
   EXPECT_EQ(Session::StatusOf(effect), 4);
@@ -103,7 +93,7 @@ TEST_F(TourFaults, AStatusThatCouldNotBeToldIsToldWithTheNextTick) {
   Operations::Get().FailNone();
   EXPECT_TRUE(effect.Tick().ok());
   EXPECT_TRUE(effect.Press(kAnalyze).ok());
-  EXPECT_EQ(Settle(effect), 8);
+  EXPECT_EQ(Settle(effect), kReady);
 }
 
 // The operations of a tour by name: the first, the second and the last, which other threads' make

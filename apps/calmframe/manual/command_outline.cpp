@@ -1,5 +1,6 @@
 #include "apps/calmframe/manual/command_outline.h"
 
+#include <CLI/CLI.hpp>
 #include <algorithm>
 #include <sstream>
 

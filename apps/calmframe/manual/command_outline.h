@@ -1,8 +1,11 @@
 #pragma once
 
-#include <CLI/CLI.hpp>
 #include <string>
 #include <vector>
+
+namespace CLI {
+class App;
+}
 
 // What can be typed, read off the parser, which is the one place where it is said. The help, the
 // manual page and the shells' completions are written from this.

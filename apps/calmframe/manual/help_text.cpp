@@ -11,7 +11,7 @@ namespace {
 std::string Row(const std::string& name, const std::string& meaning, std::size_t column) {
   std::string row = "  " + name;
   if (row.size() + 2 > column)
-    row += "\n" + std::string(column, ' ');
+    row.append(1, '\n').append(column, ' ');
   else
     row.resize(column, ' ');
   return row + Wrapped(meaning, column) + "\n";
@@ -29,12 +29,12 @@ std::string HelpText(const CLI::App& command) {
     std::size_t begin = 0;
     while (begin != std::string::npos) {
       const std::size_t end = outline.details.find("\n\n", begin);
-      text += "\n" + Wrapped(outline.details.substr(begin, end - begin), 0) + "\n";
+      text.append("\n").append(Wrapped(outline.details.substr(begin, end - begin), 0)).append("\n");
       begin = end == std::string::npos ? end : end + 2;
     }
   }
   const auto add = [&](const std::string& title, const std::vector<Argument>& arguments) {
-    text += "\n" + (title.empty() ? "" : title + ":\n");
+    text += title.empty() ? "\n" : "\n" + title + ":\n";
     for (const Argument& argument : arguments) {
       text += Row(UsageOf(argument), DescriptionOf(argument), kColumn);
     }

@@ -9,7 +9,12 @@ namespace calmframe::manual {
 namespace {
 
 std::string Joined(const std::vector<std::string>& words) {
-  return CLI::detail::join(words, " ");
+  std::string joined;
+  for (const std::string& word : words) {
+    if (!joined.empty()) joined += ' ';
+    joined += word;
+  }
+  return joined;
 }
 
 std::vector<Argument> FlagsOf(const Command& command) {
@@ -40,7 +45,7 @@ std::string Quoted(const std::string& text) {
 }  // namespace
 
 std::string BashCompletion(const CLI::App& program) {
-  const std::string name = program.get_name();
+  const std::string name = OutlineOf(program).name;
   std::vector<std::string> commands;
   std::string cases;
   std::map<std::string, Argument> with_value;  // a flag means the same in all commands
@@ -98,7 +103,7 @@ complete -F _)" +
 }
 
 std::string ZshCompletion(const CLI::App& program) {
-  const std::string name = program.get_name();
+  const std::string name = OutlineOf(program).name;
   std::string commands, cases;
   for (const Command& command : CommandsOf(program)) {
     commands += "    " + Quoted(command.name + ":" + command.summary) + "\n";
@@ -108,7 +113,7 @@ std::string ZshCompletion(const CLI::App& program) {
       if (!flag.value.empty()) {
         spec += ":" + flag.value + ":";
         if (flag.takes_file) spec += "_files";
-        if (!flag.choices.empty()) spec += "(" + Joined(flag.choices) + ")";
+        if (!flag.choices.empty()) spec.append("(").append(Joined(flag.choices)).append(")");
       }
       cases += " \\\n        " + Quoted(spec);
     }
@@ -121,8 +126,10 @@ std::string ZshCompletion(const CLI::App& program) {
 }
 
 std::string FishCompletion(const CLI::App& program) {
-  const std::string name = program.get_name();
-  const auto quoted = [](const std::string& text) { return "'" + Escaped(text, "'\\") + "'"; };
+  const std::string name = OutlineOf(program).name;
+  const auto quoted = [](const std::string& text) {
+    return std::string("'").append(Escaped(text, "'\\")).append("'");
+  };
   std::string script = "complete -c " + name + " -n __fish_use_subcommand -f\n";
   for (const Command& command : CommandsOf(program)) {
     script += "complete -c " + name + " -n __fish_use_subcommand -a " + command.name + " -d " +

@@ -1,4 +1,4 @@
-#include "apps/report/picture.h"
+#include "apps/report/data_url.h"
 
 extern "C" {
 #include <libavcodec/avcodec.h>
