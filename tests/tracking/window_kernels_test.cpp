@@ -1,5 +1,3 @@
-#include "tracking/window_kernels.h"
-
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -10,6 +8,10 @@
 
 #include "tests/support/each_instruction_set.h"
 #include "tests/tracking/tracker_images.h"
+#include "tracking/window_moments.h"
+#include "tracking/window_products.h"
+#include "tracking/window_residuals.h"
+#include "tracking/window_sampling.h"
 
 namespace marrow::tracking {
 namespace {
