@@ -94,9 +94,9 @@ void PresmoothingOpenCv(benchmark::State& state) {
   }
 }
 
-// Stages 1 to 3: gradient sums; scores in their place; with maxima.
-template <int kStages>
-void RowStages(benchmark::State& state) {
+// Gradient sums and scores, and with their maxima.
+template <bool kMaxima>
+void Scores(benchmark::State& state) {
   const SelectorParams params = Params(state);
   const std::size_t w = state.range(0), h = state.range(1), inset = params.half_winx + 1;
   const std::vector<std::uint8_t> scene = Scene(w, h);
@@ -115,10 +115,9 @@ void RowStages(benchmark::State& state) {
       const auto row = [&](std::size_t r) {
         return &scores[r % 3 * stride + RowFolding::kSegments];
       };
-      if (kStages == 1) sums.NextRow();
-      if (kStages > 1) sums.NextScores(params.eig_ratio_threshold, row(y));
-      if (kStages > 2) FillHalo(row(y), folding.positions(), 1, 0.0f, 0.0f);
-      if (kStages > 2 && y > 1) {
+      sums.NextScores(params.eig_ratio_threshold, row(y));
+      if (kMaxima) FillHalo(row(y), folding.positions(), 1, 0.0f, 0.0f);
+      if (kMaxima && y > 1) {
         FindMaxima(row(y - 2), row(y - 1), row(y), folding, inset, w - inset - 1, 441.0f, maxima);
       }
       benchmark::ClobberMemory();
@@ -198,9 +197,8 @@ BENCHMARK(GoodFeaturesToTrackOpenCv<false>)->FRAME_SIZES;
 BENCHMARK(GoodFeaturesToTrackOpenCv<true>)->FRAME_SIZES;
 BENCHMARK(Presmoothing)->FRAME_SIZES;
 BENCHMARK(PresmoothingOpenCv)->FRAME_SIZES;
-BENCHMARK(RowStages<1>)->FRAME_SIZES;
-BENCHMARK(RowStages<2>)->FRAME_SIZES;
-BENCHMARK(RowStages<3>)->FRAME_SIZES;
+BENCHMARK(Scores<false>)->FRAME_SIZES;
+BENCHMARK(Scores<true>)->FRAME_SIZES;
 BENCHMARK(PlainSumsAndScores)->FRAME_SIZES;
 BENCHMARK(SelectionOnly)->FRAME_SIZES;
 

@@ -81,8 +81,8 @@ struct Clip {
     return pyramid;
   }
 
-  void Translate(FeatureTracker& tracker, std::vector<tracking_feature<float>>& row) {
-    tracker.TrackFeatures(previous, current, seeds.data(), row.data(), seeds.size(), statistics);
+  void Track(FeatureTracker& tracker, std::vector<tracking_feature<float>>& row) {
+    tracker.TrackAndVerify(previous, current, seeds.data(), row.data(), seeds.size(), statistics);
   }
 
   std::size_t width, height;
@@ -116,38 +116,34 @@ void ReportRow(benchmark::State& state, const Clip& clip,
   Report(state, clip.seeds.size(), off);
 }
 
+// Without verification.
 void Translation(benchmark::State& state) {
   Clip clip(state);
+  clip.params.affine_verification = false;
   FeatureTracker tracker(clip.params, clip.seeds.size(), 3);
   std::vector<tracking_feature<float>> row(clip.seeds.size());
-  for (auto _ : state) clip.Translate(tracker, row);
+  for (auto _ : state) clip.Track(tracker, row);
   ReportRow(state, clip, row);
 }
 
 // Of seeds whose matrices were formed in a frame before, as for all but a track's first frame. The
 // warp that is found stays: an iteration goes on from where the last one ended.
-void Verification(benchmark::State& state) {
+void TranslationAndVerification(benchmark::State& state) {
   Clip clip(state);
   FeatureTracker tracker(clip.params, clip.seeds.size(), 3);
   tracker.InitialiseSeeds(clip.previous, clip.seeds.data());
-  std::vector<tracking_feature<float>> translated(clip.seeds.size()), row;
-  clip.Translate(tracker, translated);
-  for (auto _ : state) {
-    row = translated;
-    tracker.VerifyFeatures(clip.current, row.data(), clip.statistics);
-  }
+  std::vector<tracking_feature<float>> row(clip.seeds.size());
+  for (auto _ : state) clip.Track(tracker, row);
   ReportRow(state, clip, row);
 }
 
-void SeedsAndFirstVerification(benchmark::State& state) {
+void SeedsAndTheirFirstFrame(benchmark::State& state) {
   Clip clip(state);
   FeatureTracker tracker(clip.params, clip.seeds.size(), 3);
-  std::vector<tracking_feature<float>> translated(clip.seeds.size()), row;
-  clip.Translate(tracker, translated);
+  std::vector<tracking_feature<float>> row(clip.seeds.size());
   for (auto _ : state) {
     tracker.InitialiseSeeds(clip.previous, clip.seeds.data());
-    row = translated;
-    tracker.VerifyFeatures(clip.current, row.data(), clip.statistics);
+    clip.Track(tracker, row);
   }
   ReportRow(state, clip, row);
 }
@@ -160,8 +156,7 @@ void TrackingStep(benchmark::State& state) {
   std::vector<tracking_feature<float>> row(clip.seeds.size());
   for (auto _ : state) {
     BuildLevels(clip.current);
-    clip.Translate(tracker, row);
-    tracker.VerifyFeatures(clip.current, row.data(), clip.statistics);
+    clip.Track(tracker, row);
   }
   ReportRow(state, clip, row);
 }
@@ -196,8 +191,8 @@ BENCHMARK(OpticalFlowOpenCv<true>)->FRAME_SIZES;
 BENCHMARK(OpticalFlowOpenCv<false>)->FRAME_SIZES;
 BENCHMARK(TrackingStep)->FRAME_SIZES;
 BENCHMARK(Translation)->FRAME_SIZES;
-BENCHMARK(Verification)->FRAME_SIZES;
-BENCHMARK(SeedsAndFirstVerification)->FRAME_SIZES;
+BENCHMARK(TranslationAndVerification)->FRAME_SIZES;
+BENCHMARK(SeedsAndTheirFirstFrame)->FRAME_SIZES;
 
 }  // namespace
 }  // namespace marrow::tracking

@@ -2,6 +2,10 @@
 
 #include <cmath>
 
+#include "tracking/window_products.h"
+#include "tracking/window_residuals.h"
+#include "tracking/window_sampling.h"
+
 namespace marrow::tracking {
 namespace {
 

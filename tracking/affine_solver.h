@@ -3,7 +3,7 @@
 #include "tracking/affine_state.h"
 #include "tracking/packed_cholesky.h"
 #include "tracking/translation_solver.h"
-#include "tracking/window_kernels.h"
+#include "tracking/window_shape.h"
 
 namespace marrow::tracking {
 

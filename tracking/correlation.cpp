@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cmath>
 
+#include "tracking/window_moments.h"
+
 namespace marrow::tracking {
 
 channel_moments ChannelMoments(const float* window, const window_shape& shape) {

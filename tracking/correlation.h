@@ -2,7 +2,7 @@
 
 #include <cstddef>
 
-#include "tracking/window_kernels.h"
+#include "tracking/window_shape.h"
 
 namespace marrow::tracking {
 

@@ -77,10 +77,10 @@ void FeatureSelector::Configure(std::size_t width, std::size_t height) {
       std::make_unique<SeparableSmoother>(std::move(kernel), width, gradient_sums_->kept_rows());
 }
 
-FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
+void FeatureSelector::ComputeCandidates() {
   candidates.clear();
   const PixelRegion& region = scoring_region_;
-  if (region.empty()) return {};
+  if (region.empty()) return;
   // A score's neighbours all lie in the scoring region, whose outermost pixels are never
   // candidates. Three rows of scores are kept, so each is still in the cache when it is compared.
   const float area = static_cast<float>((2 * params_.half_winx + 1) * (2 * params_.half_winy + 1));
@@ -125,17 +125,15 @@ FeatureSelector::ScoreRange FeatureSelector::ComputeCandidates() {
   check_masks();
   if (best < 0.0f) {
     candidates.clear();
-    return {};
+    return;
   }
 
   const float cap = std::min(best, highest_cap);
   const float limit = std::max(params_.threshold * cap, floor);
   std::erase_if(candidates, [limit](const Candidate& c) { return c.score < limit; });
-  if (candidates.empty()) return {};
   std::sort(candidates.begin(), candidates.end(), [](const Candidate& a, const Candidate& b) {
     return a.score != b.score ? a.score > b.score : a.pixel < b.pixel;
   });
-  return {candidates.front().score / area, candidates.back().score / area};
 }
 
 void FeatureSelector::SelectFirst() {

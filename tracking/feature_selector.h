@@ -29,10 +29,6 @@ class FeatureSelector {
   struct Feature {  // in whole pixels
     float x, y, score;
   };
-  struct ScoreRange {  // per pixel of the window
-    float best = 0.0f;
-    float worst = 0.0f;
-  };
 
   explicit FeatureSelector(const SelectorParams& params);
 
@@ -45,9 +41,8 @@ class FeatureSelector {
   std::uint8_t* luma() { return luma_.data(); }
   std::uint8_t* mask() { return mask_.data(); }  // 0 where no feature may be selected
 
-  // Fills `candidates`, by falling score (equal scores by position), and returns the first and the
-  // last of their scores; 0 for both if there is none.
-  ScoreRange ComputeCandidates();
+  // Fills `candidates`, by falling score (equal scores by position).
+  void ComputeCandidates();
 
   // Fill `selected`, best first, with at most params.max_count features. SelectAvoiding keeps away
   // from the cells with a status of 0 or more; it may stop at `limit` features when no more are

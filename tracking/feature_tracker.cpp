@@ -112,15 +112,6 @@ FeatureTracker::FeatureTracker(const TrackerParams& params, std::size_t feature_
   }
 }
 
-void FeatureTracker::TrackFeatures(const ImagePyramid& previous, const ImagePyramid& current,
-                                   const tracking_feature<float>* previous_row,
-                                   tracking_feature<float>* current_row, std::size_t feature_count,
-                                   TrackingStatistics& statistics) {
-  for (std::size_t s = 0; s < feature_count; ++s) {
-    TrackSlot(previous, current, previous_row[s], current_row[s], statistics);
-  }
-}
-
 void FeatureTracker::TrackAndVerify(const ImagePyramid& previous, const ImagePyramid& current,
                                     const tracking_feature<float>* previous_row,
                                     tracking_feature<float>* current_row, std::size_t feature_count,
@@ -181,13 +172,6 @@ void FeatureTracker::InitialiseSeeds(const ImagePyramid& current,
                                ? 0
                                : FindPrimaryChannel(slot.stack.Level(0), shape_, dark_threshold_);
     slot.state = AffineState(row[s].x, row[s].y);
-  }
-}
-
-void FeatureTracker::VerifyFeatures(const ImagePyramid& current, tracking_feature<float>* row,
-                                    TrackingStatistics& statistics) {
-  for (std::size_t s = 0; s < slots_.size(); ++s) {
-    VerifySlot(current, slots_[s], row[s], statistics);
   }
 }
 

@@ -24,31 +24,21 @@ class FeatureTracker {
  public:
   FeatureTracker(const TrackerParams& params, std::size_t feature_count, std::size_t channels);
 
-  // For each feature that lives in previous_row, writes x, y and status kTracked to current_row,
-  // or status kLost; for the other slots status kEmpty. Counts into statistics.translation.
-  void TrackFeatures(const ImagePyramid& previous, const ImagePyramid& current,
-                     const tracking_feature<float>* previous_row,
-                     tracking_feature<float>* current_row, std::size_t feature_count,
-                     TrackingStatistics& statistics);
-
   // Keeps what the slots of all seeds (status above 0) show in their first frame.
   void InitialiseSeeds(const ImagePyramid& current, const tracking_feature<float>* row);
 
-  // For each cell with status kTracked, matches the slot's first window against this frame,
+  // Follows each feature that lives in previous_row, for the first feature_count slots: writes x, y
+  // and status kTracked to current_row, or status kLost; for the other slots status kEmpty. Counts
+  // into statistics.translation.
+  // What was tracked is then verified: the slot's first window is matched against this frame,
   // starting at the cell's position with the warp and colours of the frame before. Writes x, y and
   // correlation, or status kRejected (the correlation in the cell is not under the limit) or
-  // kRejectedCorrelation. Counts into statistics.verification.
-  void VerifyFeatures(const ImagePyramid& current, tracking_feature<float>* row,
-                      TrackingStatistics& statistics);
-
-  // TrackFeatures and VerifyFeatures in one walk over the slots, with the same outcome: a feature's
+  // kRejectedCorrelation. Counts into statistics.verification. Slot by slot, so that a feature's
   // second match finds the pixels of its first one in the cache.
   void TrackAndVerify(const ImagePyramid& previous, const ImagePyramid& current,
                       const tracking_feature<float>* previous_row,
                       tracking_feature<float>* current_row, std::size_t feature_count,
                       TrackingStatistics& statistics);
-
-  const AffineState& state(std::size_t slot) const { return slots_[slot].state; }
 
  private:
   // What depends on one level of a template alone, computed when it is first needed.

@@ -110,9 +110,8 @@ void ColorRows(const ArgbFrame& frame, float* color) {
   }
 }
 
-// With kLuma, makes luma too and tells whether every pixel's alpha is above 127.
-template <bool kLuma>
-HWY_INLINE bool ColorBytes(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {
+// Tells whether every pixel's alpha is above 127.
+bool ColorAndLumaRows(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {
   const Pixels d32;
   auto alphas = hn::Set(d32, 255);
   std::uint8_t last_alphas = 255;
@@ -140,31 +139,19 @@ HWY_INLINE bool ColorBytes(const ArgbFrame& frame, std::uint8_t* color, std::uin
       const auto blocks = hn::TableLookupBytes(bytes, colors);
       const auto packed = hn::TableLookupLanes(hn::BitCast(words, blocks), together);
       hn::StoreU(hn::BitCast(d, packed), d, color + 3 * x);
-      if constexpr (kLuma) {
-        const auto pixels = hn::BitCast(d32, bytes);
-        alphas = hn::And(alphas, pixels);
-        hn::StoreU(hn::DemoteTo(d8, LumaOf(pixels)), d8, luma + x);
-      }
+      const auto pixels = hn::BitCast(d32, bytes);
+      alphas = hn::And(alphas, pixels);
+      hn::StoreU(hn::DemoteTo(d8, LumaOf(pixels)), d8, luma + x);
     }
 #endif
     for (; x < frame.width; ++x) {
       for (std::size_t c = 0; c < 3; ++c) color[3 * x + c] = row[4 * x + 1 + c];
-      if constexpr (kLuma) {
-        luma[x] = LumaOfPixel(row + 4 * x);
-        last_alphas &= row[4 * x];
-      }
+      luma[x] = LumaOfPixel(row + 4 * x);
+      last_alphas &= row[4 * x];
     }
   }
   const auto high_bit = hn::Set(d32, 128);
   return hn::AllTrue(d32, hn::Eq(hn::And(alphas, high_bit), high_bit)) && last_alphas > 127;
-}
-
-void ColorByteRows(const ArgbFrame& frame, std::uint8_t* color) {
-  ColorBytes<false>(frame, color, nullptr);
-}
-
-bool ColorAndLumaRows(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {
-  return ColorBytes<true>(frame, color, luma);
 }
 
 // (before + 2 centre + after) / 4 of every other pixel. Two colours are summed in a lane, 16 bits
@@ -230,7 +217,6 @@ namespace marrow::tracking {
 HWY_EXPORT(LumaRows);
 HWY_EXPORT(MaskRows);
 HWY_EXPORT(ColorRows);
-HWY_EXPORT(ColorByteRows);
 HWY_EXPORT(ColorAndLumaRows);
 HWY_EXPORT(ReducedColorRow);
 HWY_EXPORT(WidenBytes);
@@ -245,10 +231,6 @@ void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask) {
 
 void ColorFromArgb(const ArgbFrame& frame, float* color) {
   HWY_DYNAMIC_DISPATCH(ColorRows)(frame, color);
-}
-
-void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color) {
-  HWY_DYNAMIC_DISPATCH(ColorByteRows)(frame, color);
 }
 
 bool ColorAndLumaFromArgb(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma) {

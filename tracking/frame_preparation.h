@@ -21,12 +21,10 @@ void LumaFromArgb(const ArgbFrame& frame, std::uint8_t* luma);
 // width * height bytes: 1 where alpha is above 127, else 0.
 void MaskFromArgb(const ArgbFrame& frame, std::uint8_t* mask);
 
-// width * height * 3 floats or bytes: red, green, blue from 0 to 255, interleaved, whatever alpha
-// is.
+// width * height * 3 floats: red, green, blue from 0 to 255, interleaved, whatever alpha is.
 void ColorFromArgb(const ArgbFrame& frame, float* color);
-void ColorFromArgb(const ArgbFrame& frame, std::uint8_t* color);
 
-// Colour and luma in one walk. True if the whole mask would be 1.
+// Colour, in bytes, and luma in one walk. True if the whole mask would be 1.
 bool ColorAndLumaFromArgb(const ArgbFrame& frame, std::uint8_t* color, std::uint8_t* luma);
 
 // A row of the colours' next pyramid level from the frame's row over it, which has `width` pixels,

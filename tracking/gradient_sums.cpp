@@ -167,16 +167,20 @@ void SumToEnds(std::size_t groups, std::size_t count, float* planes, std::size_t
   }
 }
 
-// Windows along x. `columns` begins half a window before the first position; `ends` has room for a
-// window. take(index in a row, sums).
-template <class Take>
-HWY_INLINE void SumWindows(const float* HWY_RESTRICT columns, std::size_t column_stride,
-                           std::size_t window, std::size_t positions, float* HWY_RESTRICT ends,
-                           Take take) {
+// Windows along x, and their scores. `columns` begins half a window before the first position;
+// `ends` has room for a window.
+void ScoreRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
+              std::size_t positions, float* HWY_RESTRICT ends, float most_ratio,
+              float* HWY_RESTRICT scores) {
+  const Floats d;
+  const auto ratio = hn::Set(d, most_ratio);
+  const auto score = [=](std::size_t i, const Matrix& m) HWY_ATTR {
+    hn::StoreU(CornerScore(d, m.xx, m.yy, m.xy, ratio), d, scores + i);
+  };
   const std::size_t ends_stride = window * kSegments;
   for (std::size_t first = 0; first < positions; first += window) {
     const std::size_t here = std::min(window, positions - first);
-    for (std::size_t i = 0; i < kSegments; i += hn::Lanes(Floats())) {
+    for (std::size_t i = 0; i < kSegments; i += hn::Lanes(d)) {
       const float* block = columns + first * kSegments + i;
       Matrix sum = LoadMatrix(block + (window - 1) * kSegments, column_stride);
       StoreMatrix(sum, ends + (window - 1) * kSegments + i, ends_stride);
@@ -184,35 +188,17 @@ HWY_INLINE void SumWindows(const float* HWY_RESTRICT columns, std::size_t column
         sum = Add(LoadMatrix(block + (p - 1) * kSegments, column_stride), sum);
         StoreMatrix(sum, ends + (p - 1) * kSegments + i, ends_stride);
       }
-      take(first * kSegments + i, sum);
+      score(first * kSegments + i, sum);
       const float* next = block + window * kSegments;
       Matrix start;
       for (std::size_t p = 1; p < here; ++p) {
         const Matrix m = LoadMatrix(next + (p - 1) * kSegments, column_stride);
         start = p == 1 ? m : Add(start, m);
-        take((first + p) * kSegments + i,
-             AddByMultiplier(LoadMatrix(ends + p * kSegments + i, ends_stride), start));
+        score((first + p) * kSegments + i,
+              AddByMultiplier(LoadMatrix(ends + p * kSegments + i, ends_stride), start));
       }
     }
   }
-}
-
-void SumRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
-            std::size_t positions, float* HWY_RESTRICT ends, float* HWY_RESTRICT sums,
-            std::size_t sum_stride) {
-  SumWindows(columns, column_stride, window, positions, ends,
-             [=](std::size_t i, const Matrix& m)
-                 HWY_ATTR { StoreMatrix(m, sums + i, sum_stride); });
-}
-
-void ScoreRow(const float* HWY_RESTRICT columns, std::size_t column_stride, std::size_t window,
-              std::size_t positions, float* HWY_RESTRICT ends, float most_ratio,
-              float* HWY_RESTRICT scores) {
-  const Floats d;
-  const auto ratio = hn::Set(d, most_ratio);
-  SumWindows(columns, column_stride, window, positions, ends,
-             [=](std::size_t i, const Matrix& m)
-                 HWY_ATTR { hn::StoreU(CornerScore(d, m.xx, m.yy, m.xy, ratio), d, scores + i); });
 }
 
 }  // namespace HWY_NAMESPACE
@@ -226,7 +212,6 @@ namespace {
 HWY_EXPORT(SumColumns);
 HWY_EXPORT(SumGroup);
 HWY_EXPORT(SumToEnds);
-HWY_EXPORT(SumRow);
 HWY_EXPORT(ScoreRow);
 
 constexpr std::size_t kMostGroup = 6;
@@ -247,13 +232,12 @@ GradientSums::GradientSums(std::size_t half_win_x, std::size_t half_win_y, std::
       rest_(group_ == 1 ? 0 : window_y_ % group_),
       whole_(window_y_ / group_ - 1) {
   const std::size_t positions = RowFolding{max_width}.positions();
-  group_stride_ = sum_stride_ = FoldedStride(positions);
+  group_stride_ = FoldedStride(positions);
   column_stride_ = FoldedStride(positions + window_x_ - 1);
   groups_.resize(whole_ * 3 * group_stride_);
   block_start_.resize(3 * group_stride_);
   column_sums_.resize(group_ * 3 * column_stride_);
   ends_.resize(3 * window_x_ * RowFolding::kSegments);
-  sums_.resize(3 * sum_stride_);
 }
 
 void GradientSums::Start(ImageRows image, std::size_t columns, std::size_t first_row,
@@ -268,13 +252,6 @@ void GradientSums::Start(ImageRows image, std::size_t columns, std::size_t first
 const float* GradientSums::NextColumnSums() {
   if (next_ % group_ == 0) SumNextColumns();
   return column_sums_.data() + next_++ % group_ * 3 * column_stride_;
-}
-
-gradient_sum_row GradientSums::NextRow() {
-  HWY_DYNAMIC_DISPATCH(SumRow)
-  (NextColumnSums(), column_stride_, window_x_, positions_, ends_.data(), sums_.data(),
-   sum_stride_);
-  return {sums_.data(), sums_.data() + sum_stride_, sums_.data() + 2 * sum_stride_};
 }
 
 void GradientSums::NextScores(float eig_ratio_threshold, float* scores) {

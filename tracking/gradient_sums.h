@@ -10,13 +10,6 @@
 
 namespace marrow::tracking {
 
-// A folded row of gradient matrices: for each pixel the window's sums of Ix Ix, Iy Iy and Ix Iy.
-struct gradient_sum_row {
-  const float* xx;
-  const float* yy;
-  const float* xy;
-};
-
 // Row y of an image, folded, with a halo of one position. Readers that go down an image ask for a
 // row again while it is at most a given number of rows above the lowest one they have seen.
 using ImageRows = std::function<const float*(std::size_t y)>;
@@ -36,9 +29,9 @@ struct column_window {
   std::size_t sum_stride;
 };
 
-// The gradient matrix of each pixel's window, row by row from the top: sums over (2 half_win_x + 1)
-// by (2 half_win_y + 1) pixels of Ix Ix, Iy Iy and Ix Iy, where Ix = I(x + 1, y) - I(x - 1, y) and
-// Iy likewise, not halved.
+// Scores of the gradient matrix of each pixel's window, row by row from the top. A matrix has the
+// sums over (2 half_win_x + 1) by (2 half_win_y + 1) pixels of Ix Ix, Iy Iy and Ix Iy, where
+// Ix = I(x + 1, y) - I(x - 1, y) and Iy likewise, not halved.
 //
 // Sums of 32-bit floats to which is only added: strong texture leaves no trace once the window has
 // passed it, the sums of squares are never negative, and the cost hardly depends on the window.
@@ -57,11 +50,9 @@ class GradientSums {
   // windows, and one pixel about them, must lie inside the image.
   void Start(ImageRows image, std::size_t columns, std::size_t first_row, std::size_t rows);
 
-  // The next row: its sums, valid until the next call, or its scores (CornerScore), as many values
-  // as there are in a folded row, without a way through memory for the sums. Where a window, with
-  // one pixel about it, does not lie inside the image, and behind the last column, they mean
-  // nothing.
-  gradient_sum_row NextRow();
+  // The next row's scores (CornerScore), as many values as there are in a folded row. Where a
+  // window, with one pixel about it, does not lie inside the image, and behind the last column,
+  // they mean nothing.
   void NextScores(float eig_ratio_threshold, float* scores);
 
  private:
@@ -75,7 +66,7 @@ class GradientSums {
   std::size_t group_;  // rows in a group; so many rows of windows are made together
   std::size_t rest_;   // rows of a window over whole groups
   std::size_t whole_;  // groups that lie wholly inside all windows of a group of rows
-  std::size_t group_stride_, column_stride_, sum_stride_;  // between planes
+  std::size_t group_stride_, column_stride_;  // between planes
   ImageRows image_;
   std::size_t positions_ = 0;
   std::size_t window_top_ = 0;  // first row of the windows that come next
@@ -87,7 +78,6 @@ class GradientSums {
   memory::LineAlignedVector<float> block_start_;  // sum of the groups of the next block so far
   memory::LineAlignedVector<float> column_sums_;  // along y alone, by row of a group
   memory::LineAlignedVector<float> ends_;         // along x: from a position to its block's end
-  memory::LineAlignedVector<float> sums_;
 };
 
 }  // namespace marrow::tracking

@@ -3,6 +3,10 @@
 #include <cmath>
 
 #include "tracking/correlation.h"
+#include "tracking/window_moments.h"
+#include "tracking/window_products.h"
+#include "tracking/window_residuals.h"
+#include "tracking/window_sampling.h"
 
 namespace marrow::tracking {
 namespace {

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cmath>
 
+#include "tracking/window_sampling.h"
+
 namespace marrow::tracking {
 namespace {
 

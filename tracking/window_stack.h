@@ -4,7 +4,7 @@
 
 #include "platform/memory/line_aligned.h"
 #include "tracking/image_pyramid.h"
-#include "tracking/window_kernels.h"
+#include "tracking/window_shape.h"
 
 namespace marrow::tracking {
 

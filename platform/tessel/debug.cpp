@@ -84,9 +84,6 @@ void Write(const std::string& text) {
 bool DebugDatabase::GetBool(const std::string& name, bool unless_set) {
   return database().Get(name, unless_set) != 0;
 }
-int DebugDatabase::GetInt(const std::string& name) {
-  return database().Get(name, 0);
-}
 void DebugDatabase::Set(const std::string& name, int value) {
   database().Set(name, value);
 }

@@ -15,7 +15,6 @@ namespace tessel::debug {
 class DebugDatabase {
  public:
   static bool GetBool(const std::string& name, bool unless_set = false);
-  static int GetInt(const std::string& name);
   static void Set(const std::string& name, int value);
 };
 

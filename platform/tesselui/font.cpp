@@ -52,20 +52,11 @@ Font Font::HostFont() {
   return Font(kHostFontPixels);
 }
 
-Font Font::HostFont(double pixels) {
-  return Font(pixels);
-}
-
 TextExtent Font::Measure(const std::string& text) const {
   const TextLayout layout(*this, text);
   TextExtent extent;
   pango_layout_get_pixel_size(layout.get(), &extent.width, &extent.height);
   return extent;
-}
-
-int Font::Ascent() const {
-  const TextLayout layout(*this, "x");
-  return PANGO_PIXELS(pango_layout_get_baseline(layout.get()));
 }
 
 }  // namespace tesselui

@@ -13,13 +13,10 @@ struct TextExtent {
 class Font {
  public:
   static Font HostFont();
-  static Font HostFont(double pixels);  // height of the em square
 
   // UTF-8; a line break begins a line.
   TextExtent Measure(const std::string& text) const;
-  // From the top of a line to its baseline.
-  int Ascent() const;
-  double pixels() const { return pixels_; }
+  double pixels() const { return pixels_; }  // height of the em square
 
  private:
   explicit Font(double pixels) : pixels_(pixels) {}

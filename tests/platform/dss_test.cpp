@@ -4,6 +4,7 @@
 
 #include <cmath>
 #include <limits>
+#include <numeric>
 #include <random>
 #include <vector>
 
@@ -33,17 +34,6 @@ System RandomSystem(int n, int band, unsigned seed) {
   return s;
 }
 
-double LargestResidual(const System& s, const std::vector<double>& x,
-                       const std::vector<double>& b) {
-  double largest = 0;
-  for (int r = 0; r < s.n; ++r) {
-    double sum = -b[r];
-    for (int c = 0; c < s.n; ++c) sum += s.dense[r * s.n + c] * x[c];
-    largest = std::max(largest, std::fabs(sum));
-  }
-  return largest;
-}
-
 class DssTest : public ::testing::Test {
  protected:
   void Define(const System& s) {
@@ -70,8 +60,10 @@ TEST_F(DssTest, OneStructureServesManyFactorizations) {
     std::vector<double> b(2 * 60), x(2 * 60);
     for (int i = 0; i < 120; ++i) b[i] = std::sin(i);
     ASSERT_EQ(dss_solve_real(handle_, MKL_DSS_DEFAULTS, b.data(), 2, x.data()), 0);
-    EXPECT_LT(LargestResidual(s, {x.begin(), x.begin() + 60}, {b.begin(), b.begin() + 60}), 1e-12);
-    EXPECT_LT(LargestResidual(s, {x.begin() + 60, x.end()}, {b.begin() + 60, b.end()}), 1e-12);
+    for (int i = 0; i < 120; ++i) {
+      const double* of = &x[i / 60 * 60];
+      EXPECT_NEAR(std::inner_product(of, of + 60, &s.dense[i % 60 * 60], 0.0), b[i], 1e-12);
+    }
   }
 }
 

@@ -30,20 +30,23 @@ TEST(ImporterTest, CallbacksHearOfPausesAndOfOneThatIsOn) {
 }
 
 TEST(ImporterTest, UnregisteringWaitsForARunningCallback) {
-  threads::CompletionEvent running, go_on;
-  bool ended = false;  // plain: unregistering orders the accesses
-  const utility::Guid id = RegisterPauseCallback([&](bool pause) {
-    if (!pause) return;
-    running.Signal();
-    go_on.WaitFor(std::chrono::milliseconds(20));
-    ended = true;
-  });
-  std::thread host([] { PauseBackgroundWork(true); });
-  running.Wait();
-  UnregisterPauseCallback(id);
-  EXPECT_TRUE(ended);
-  host.join();
-  PauseBackgroundWork(false);
+  for (int round = 0; round < 50; ++round) {
+    threads::CompletionEvent running, leaving;
+    bool ended = false;  // plain: unregistering orders the accesses
+    const utility::Guid id = RegisterPauseCallback([&](bool pause) {
+      if (!pause) return;
+      running.Signal();
+      leaving.Wait();
+      ended = true;
+    });
+    std::thread host([] { PauseBackgroundWork(true); });
+    running.Wait();
+    leaving.Signal();
+    UnregisterPauseCallback(id);
+    EXPECT_TRUE(ended);
+    host.join();
+    PauseBackgroundWork(false);
+  }
 }
 
 TEST(ImporterTest, ACallbackMayDropTheLastOwnerOfAnother) {

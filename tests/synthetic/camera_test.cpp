@@ -14,10 +14,7 @@ TEST(CameraTest, AQuarterTurnToTheEast) {
   const pinhole camera = {1000, 320, 240};
   const camera_pose pose = {{0, -std::numbers::pi / 2, 0}, {1, 2, 3}};
   const vector3 world = {5, 2.5, 2};
-  const vector3 c = camera_from_world(pose, world);
-  EXPECT_NEAR(c[0], 1, 1e-12);
-  EXPECT_NEAR(c[1], 0.5, 1e-12);
-  EXPECT_NEAR(c[2], 4, 1e-12);
+  EXPECT_NEAR(camera_from_world(pose, world)[2], 4, 1e-12);
   const auto pixel = pixel_from_world(camera, pose, world);
   ASSERT_TRUE(pixel);
   EXPECT_NEAR(pixel->x, 320 + 250, 1e-9);
@@ -25,8 +22,11 @@ TEST(CameraTest, AQuarterTurnToTheEast) {
   EXPECT_FALSE(pixel_from_world(camera, pose, {-3, 2.5, 2})) << "behind the camera";
 }
 
-TEST(CameraTest, BackProjectionMeetsTheSamePixel) {
-  const pinhole camera = centred_pinhole(640, 480, 1.1);
+TEST(CameraTest, BackProjectionMeetsTheSamePixelOfTheFieldOfView) {
+  const pinhole camera = centred_pinhole(640, 480, std::numbers::pi / 2);
+  EXPECT_NEAR(camera.focal, 320, 1e-10);
+  EXPECT_EQ(camera.centre_x, 319.5);
+  EXPECT_EQ(camera.centre_y, 239.5);
   const camera_pose pose = {{0.1, -0.4, 0.25}, {2, -1, 7}};
   const vector3 world = world_from_pixel(camera, pose, {123.25, 401.5}, 9.0);
   EXPECT_NEAR(camera_from_world(pose, world)[2], 9.0, 1e-12);
@@ -34,13 +34,6 @@ TEST(CameraTest, BackProjectionMeetsTheSamePixel) {
   ASSERT_TRUE(pixel);
   EXPECT_NEAR(pixel->x, 123.25, 1e-10);
   EXPECT_NEAR(pixel->y, 401.5, 1e-10);
-}
-
-TEST(CameraTest, FieldOfViewSpansTheFrame) {
-  const pinhole camera = centred_pinhole(640, 480, std::numbers::pi / 2);
-  EXPECT_NEAR(camera.focal, 320, 1e-10);
-  EXPECT_EQ(camera.centre_x, 319.5);
-  EXPECT_EQ(camera.centre_y, 239.5);
 }
 
 TEST(CameraTest, SmallRotationsJoinLargeOnes) {

@@ -57,28 +57,18 @@ std::size_t Primary(const std::vector<float>& levels, float threshold) {
   return FindPrimaryChannel(Window(channels).data(), {1, 0, levels.size()}, threshold);
 }
 
-TEST(FindPrimaryChannelTest, ThreeChannels) {
-  EXPECT_EQ(Primary({5, 5, 5}, 5), 0u) << "at the threshold is bright enough";
+// Of three channels the brighter of the two behind the first dark one, even against a brighter one
+// in front of it; of other numbers the brightest. At the threshold is bright enough.
+TEST(FindPrimaryChannelTest, WhereAChannelIsDark) {
+  const std::pair<std::vector<float>, std::size_t> cases[] = {
+      {{5, 5, 5}, 0}, {{1, 9, 8}, 2}, {{1, 8, 9}, 3}, {{1, 8, 8}, 2},
+      {{8, 1, 9}, 3}, {{9, 1, 8}, 1}, {{8, 1, 8}, 3}, {{9, 8, 1}, 1},
+      {{8, 9, 1}, 2}, {{8, 8, 1}, 1}, {{4, 1, 2}, 3}, {{90, 1, 2}, 1},
+      {{7}, 0},       {{1}, 1},       {{1, 9}, 2},    {{6, 9, 30, 1}, 3}};
+  for (const auto& [levels, expected] : cases) {
+    EXPECT_EQ(Primary(levels, 5), expected) << ::testing::PrintToString(levels);
+  }
   EXPECT_EQ(Primary({0, 0, 0}, 0), 0u) << "the test is off";
-  EXPECT_EQ(Primary({1, 9, 8}, 5), 2u);
-  EXPECT_EQ(Primary({1, 8, 9}, 5), 3u);
-  EXPECT_EQ(Primary({1, 8, 8}, 5), 2u);
-  EXPECT_EQ(Primary({8, 1, 9}, 5), 3u);
-  EXPECT_EQ(Primary({9, 1, 8}, 5), 1u);
-  EXPECT_EQ(Primary({8, 1, 8}, 5), 3u);
-  EXPECT_EQ(Primary({9, 8, 1}, 5), 1u);
-  EXPECT_EQ(Primary({8, 9, 1}, 5), 2u);
-  EXPECT_EQ(Primary({8, 8, 1}, 5), 1u);
-  // Only the first dark channel counts, even against a brighter one in front of it.
-  EXPECT_EQ(Primary({4, 1, 2}, 5), 3u);
-  EXPECT_EQ(Primary({90, 1, 2}, 5), 1u);
-}
-
-TEST(FindPrimaryChannelTest, OtherNumbersOfChannelsTakeTheBrightest) {
-  EXPECT_EQ(Primary({7}, 5), 0u);
-  EXPECT_EQ(Primary({1}, 5), 1u);
-  EXPECT_EQ(Primary({1, 9}, 5), 2u);
-  EXPECT_EQ(Primary({6, 9, 30, 1}, 5), 3u);
 }
 
 }  // namespace

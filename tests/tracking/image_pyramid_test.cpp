@@ -85,7 +85,7 @@ TEST(ReduceLevelTest, EqualsThePlainLoopsAtEverySizeAboutAVector) {
   }
 }
 
-TEST(ReduceLevelTest, ASourceUnderThreePixelsClearsTheFirstRowOnly) {
+TEST(ReduceLevelTest, WhatIsLeftUnreducedIsCleared) {
   const std::vector<float> image(2 * 8, 5.0f);
   std::vector<float> reduced(8, kUntouched);
   ReduceLevel(image.data(), 2, 8, 1, reduced.data());
@@ -94,15 +94,11 @@ TEST(ReduceLevelTest, ASourceUnderThreePixelsClearsTheFirstRowOnly) {
   reduced.assign(8, kUntouched);
   ReduceLevel(image.data(), 8, 2, 1, reduced.data());
   EXPECT_THAT(reduced, ElementsAre(0, 0, 0, 0, kUntouched, kUntouched, kUntouched, kUntouched));
-}
-
-TEST(ReduceLevelTest, TwoChannelsGetTheFrameOnly) {
-  const std::vector<float> image(6 * 6 * 2, 5.0f);
-  std::vector<float> reduced(3 * 3 * 2, kUntouched);
-  ReduceLevel(image.data(), 6, 6, 2, reduced.data());
-  std::vector<float> expected(18, 0.0f);
+  // Of two channels there is the frame only.
+  std::vector<float> framed(3 * 3 * 2, kUntouched), expected(18, 0.0f);
+  ReduceLevel(std::vector<float>(6 * 6 * 2, 5.0f).data(), 6, 6, 2, framed.data());
   expected[8] = expected[9] = kUntouched;
-  EXPECT_EQ(reduced, expected);
+  EXPECT_EQ(framed, expected);
 }
 
 TEST(BuildLevelsTest, EachLevelReducesTheOneBefore) {
@@ -114,14 +110,11 @@ TEST(BuildLevelsTest, EachLevelReducesTheOneBefore) {
     level = PlainReduction(level, pyramid.LevelWidth(l - 1), pyramid.LevelHeight(l - 1), 3);
     EXPECT_EQ(std::vector<float>(pyramid.LevelData(l), pyramid.LevelData(l) + level.size()), level);
   }
-}
-
-TEST(BuildLevelsTest, OneLevelOrATinyImageStaysAsItIs) {
-  for (const std::size_t levels : {0, 1}) {
-    ImagePyramid pyramid(9, 9, 3, levels);
-    std::fill(pyramid.data.begin(), pyramid.data.end(), 3.0f);
-    BuildLevels(pyramid);
-    EXPECT_THAT(pyramid.data, Each(3.0f));
+  for (const std::size_t levels : {0, 1}) {  // nothing to build
+    ImagePyramid flat(9, 9, 3, levels);
+    std::fill(flat.data.begin(), flat.data.end(), 3.0f);
+    BuildLevels(flat);
+    EXPECT_THAT(flat.data, Each(3.0f));
   }
   ImagePyramid pixel(1, 1, 3, 5);
   std::fill_n(pixel.data.begin(), 3, 3.0f);

@@ -46,13 +46,8 @@ TEST(BuildTrajectoriesTest, OrderedBySeedFrameThenSlot) {
                            "-3 0 0\n"
                            "4 0 0\n")),
               ElementsAre("0: 0-2", "1: 0-4", "2: 1-4", "0: 3-4"));
-}
-
-TEST(BuildTrajectoriesTest, ASeedUnderASeedEndsTheEarlierTrack) {
+  // A seed under a seed ends the earlier track; deleted and dead cells start nothing.
   EXPECT_THAT(Tracks(Table("1\n2\n3\n0\n")), ElementsAre("0: 0-1", "0: 1-2", "0: 2-4"));
-}
-
-TEST(BuildTrajectoriesTest, DeletedAndDeadCellsStartNothing) {
   EXPECT_THAT(Tracks(Table("-10 -1 0\n-11 0 0\n")), IsEmpty());
   EXPECT_THAT(Tracks(AllFeatures()), IsEmpty());
 }
@@ -67,13 +62,10 @@ TEST(RemoveShortTracksTest, OfTheLimitStaysShorterGoesLeavingYAndCorrelation) {
   EXPECT_EQ(removed.y, 5.0f);
   EXPECT_EQ(removed.correlation, 0.9f);
   EXPECT_EQ((*table.features)[5].status, -2);  // the cell behind a track stays as it was
-}
-
-TEST(RemoveShortTracksTest, ALimitOfOneOrZeroRemovesNothing) {
   for (const std::int32_t limit : {0, 1, -3}) {
-    AllFeatures table = Table("1 1\n2 0\n");
-    RemoveShortTracks(table, limit);
-    EXPECT_THAT(Tracks(table), ElementsAre("0: 0-1", "1: 0-2", "0: 1-2")) << limit;
+    AllFeatures short_ones = Table("1 1\n2 0\n");
+    RemoveShortTracks(short_ones, limit);
+    EXPECT_THAT(Tracks(short_ones), ElementsAre("0: 0-1", "1: 0-2", "0: 1-2")) << limit;
   }
 }
 

@@ -75,16 +75,24 @@ struct Sample {
   double value, gx, gy;
 };
 
+inline std::vector<Sample> Samples(const window_shape& shape, const float* plane) {
+  std::vector<Sample> samples;
+  for (std::size_t i = 0; i < shape.pixels() * shape.channels; ++i) {
+    samples.emplace_back(shape, plane, i);
+  }
+  return samples;
+}
+
 // The Gauss-Newton step by plain loops: least squares of J step = T - (gain I + bias) over the
-// window, where I is the present sample. Columns of J: the first `motion` of Gx / 2, Gy / 2,
-// u Gx / 2, v Gx / 2, u Gy / 2, v Gy / 2; with `color` T and 1 for each channel.
+// window, where I is the present sample and gain and bias are the state's. Columns of J: the first
+// `motion` of Gx / 2, Gy / 2, u Gx / 2, v Gx / 2, u Gy / 2, v Gy / 2; with `color` T and 1 for each
+// channel.
 inline std::vector<double> PlainStep(const Template& t, const AffineState& state,
                                      std::size_t motion, bool color) {
   const std::size_t channels = t.shape().channels;
   const std::size_t rows = motion + (color ? 2 * channels : 0);
   std::vector<std::vector<double>> h(rows, std::vector<double>(rows + 1));
-  for (std::size_t i = 0; i < t.shape().pixels() * channels; ++i) {
-    const Sample s(t.shape(), t.plane(), i);
+  for (const Sample& s : Samples(t.shape(), t.plane())) {
     const double gx = 0.5 * s.gx, gy = 0.5 * s.gy;
     const double all[] = {gx, gy, s.u * gx, s.v * gx, s.u * gy, s.v * gy};
     std::vector<double> j(all, all + motion);
@@ -93,8 +101,7 @@ inline std::vector<double> PlainStep(const Template& t, const AffineState& state
       j[motion + 2 * s.c] = s.value;
       j[motion + 2 * s.c + 1] = 1;
     }
-    const double gain = color ? state.gain[s.c] : 1, bias = color ? state.bias[s.c] : 0;
-    const double r = s.value - (gain * t.window()[s.at] + bias);
+    const double r = s.value - (1.0 * state.gain[s.c] * t.window()[s.at] + state.bias[s.c]);
     for (std::size_t a = 0; a < rows; ++a) {
       for (std::size_t b = 0; b < rows; ++b) h[a][b] += j[a] * j[b];
       h[a][rows] += j[a] * r;

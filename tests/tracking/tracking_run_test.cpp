@@ -81,43 +81,6 @@ struct Tracked {
   std::vector<TrackingStatistics> statistics;
 };
 
-TEST(TrackingRunTest, RequestsAndTheTableThatOthersSeeMeanwhile) {
-  DrawnFrames source(3, Drifting);
-  AllFeatures table;
-  table.first_frame = 40;
-  source.on_request = [&](const std::string& request) {
-    ASSERT_EQ(table.feature_count, 12);
-    ASSERT_EQ(table.frame_count, 3);
-    ASSERT_EQ(table.features->size(), 36u);
-    if (request == "C1") {
-      EXPECT_EQ((*table.features)[0].status, 1);
-    }
-  };
-  SelectorParams selector;
-  selector.max_count = 12;
-  TrackFrames(source, selector, {}, table);
-  EXPECT_EQ(source.requests, "L0 M0 C0 C1 L1 M1 C2 L2 M2 ");
-  EXPECT_EQ(table.first_frame, 40);
-}
-
-TEST(TrackingRunTest, TracksFollowADriftUnderChangingLight) {
-  DrawnFrames source(30, [](double x, double y, std::size_t f) {
-    return (1 - 0.3 * std::sin(0.9 * f)) * Drifting(x, y, f) + 15 * std::sin(1.7 * f);
-  });
-  const Tracked run(source);
-  EXPECT_THAT(run.statuses(0), Each(1));
-  int full = 0;
-  for (std::size_t s = 0; s < 12; ++s) {
-    for (std::size_t f = 1; f < 30 && run.cell(f, s).status == 0; ++f) {
-      ASSERT_NEAR(run.cell(f, s).x, run.cell(0, s).x + 0.6 * f, 0.1) << f << " " << s;
-      ASSERT_NEAR(run.cell(f, s).y, run.cell(0, s).y - 0.35 * f, 0.1) << f << " " << s;
-      ASSERT_GT(run.cell(f, s).correlation, 0.98f);
-      full += f == 29;
-    }
-  }
-  EXPECT_GE(full, 8);  // some run out of the frame
-}
-
 // Frame 4 is black: everything is lost, nothing is found. From frame 5 on all is there again.
 TEST(TrackingRunTest, LostSlotsAreFilledInTheSameFrameAndSlotsStayFreeUntilThere) {
   DrawnFrames source(
@@ -199,39 +162,32 @@ TEST(TrackingRunTest, SettingsThatSwitchThingsOff) {
   EXPECT_THAT(nothing.statuses(2), Each(feature_status::kEmpty));
 }
 
+// A source may throw at any request. Others see the table of the whole run meanwhile, and rows that
+// were finished stay.
 TEST(TrackingRunTest, ARunCanBeEndedAtEveryRequest) {
   DrawnFrames whole(3, Drifting);
   const Tracked complete(whole);
+  EXPECT_EQ(whole.requests, "L0 M0 C0 C1 L1 M1 C2 L2 M2 ");
   for (int n = 0; n < 9; ++n) {
     DrawnFrames source(3, Drifting);
+    AllFeatures table;
+    table.first_frame = 40;
     int left = n;
     source.on_request = [&](const std::string&) {
+      ASSERT_EQ(table.frame_count, 3);
+      ASSERT_EQ(table.features->size(), 36u);
       if (left-- == 0) throw std::runtime_error("cancelled");
     };
-    AllFeatures table;
     SelectorParams selector;
     selector.max_count = 12;
     EXPECT_THROW(TrackFrames(source, selector, {}, table), std::runtime_error);
-    // Rows that were finished hold what a whole run's do.
+    EXPECT_EQ(table.first_frame, 40);
     const int rows = n < 2 ? 0 : n < 6 ? 1 : 2;
     for (int i = 0; i < 12 * rows; ++i) {
       const Cell &a = (*table.features)[i], &b = (*complete.table.features)[i];
       EXPECT_EQ(a.status, b.status) << n << " " << i;
       EXPECT_EQ(a.x, b.x) << n << " " << i;
     }
-  }
-}
-
-TEST(TrackingRunTest, EqualRunsGiveEqualTables) {
-  DrawnFrames a(12, Drifting), b(12, Drifting);
-  const Tracked first(a), second(b);
-  ASSERT_EQ(first.table.features->size(), 144u);
-  for (std::size_t i = 0; i < 144; ++i) {
-    const Cell &p = (*first.table.features)[i], &q = (*second.table.features)[i];
-    ASSERT_EQ(p.x, q.x);
-    ASSERT_EQ(p.y, q.y);
-    ASSERT_EQ(p.status, q.status);
-    ASSERT_EQ(p.correlation, q.correlation);
   }
 }
 
