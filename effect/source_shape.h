@@ -12,6 +12,8 @@ struct SourceShape {
   std::int32_t par_num = 1;  // width : height of a pixel
   std::uint32_t par_den = 1;
 
+  bool operator==(const SourceShape&) const = default;
+
   // That of an instance without a layer.
   bool one_by_one() const { return width == 1 && height == 1; }
   bool SameSize(const SourceShape& other) const {

@@ -11,9 +11,9 @@
 namespace kelp {
 namespace {
 
-using analysis::NodeGraph;
 using analysis::NodeReference;
 using analysis::RationalTime;
+using analysis::SegmentGraph;
 using effect::ThrowIfFailed;
 using tessel::utility::Guid;
 
@@ -32,7 +32,7 @@ std::int64_t ToTicks(const RationalTime& time) {
 }
 
 // The node that holds the effect's operator, from `node` down; none if there is none.
-NodeReference FindOwner(const NodeGraph& graph, NodeReference node, std::int64_t effect_id,
+NodeReference FindOwner(const SegmentGraph& graph, NodeReference node, std::int64_t effect_id,
                         int depth = 0) {
   if (depth > analysis::kMaxGraphDepth) throw std::int32_t{HX_ERR_UNKNOWN};
   const std::int32_t operators = graph.OperatorCount(node.get());
@@ -51,7 +51,7 @@ NodeReference FindOwner(const NodeGraph& graph, NodeReference node, std::int64_t
 }
 
 // The media that enters the effect: its input, not its output.
-NodeReference FindMediaNode(const NodeGraph& graph, HX_EffectRef effect,
+NodeReference FindMediaNode(const SegmentGraph& graph, HX_EffectRef effect,
                             const HX_SequenceInfoSuite& sequence, const HX_UtilitySuite& utility) {
   std::uint32_t effect_id = 0;
   ThrowIfFailed(utility.GetRuntimeInstanceID(effect, &effect_id));

@@ -6,7 +6,7 @@
 
 #include "analysis/host/outstanding_requests.h"
 #include "analysis/src/executor_job.h"
-#include "analysis/src/node_graph.h"
+#include "analysis/src/segment_graph.h"
 #include "effect/suite.h"
 
 namespace kelp {
@@ -68,7 +68,7 @@ class VideoSegmentRenderSuiteJob final : public analysis::ExecutorJob {
   const effect::ScopedSuite<HX_PrivateEffectSuite3> private_;
   const effect::ScopedSuite<HX_UtilitySuite> utility_;
   const effect::ScopedSuite<HX_StringSuite1> strings_;
-  const analysis::NodeGraph graph_;
+  const analysis::SegmentGraph graph_;
   const boost::shared_ptr<OutstandingRequests> requests_;
 
   // From here on the job's thread alone, after the constructor.

@@ -1,6 +1,6 @@
 #include "analysis/src/identities.h"
 #include "analysis/src/mix_hash_guid.h"
-#include "analysis/src/node_graph.h"
+#include "analysis/src/segment_graph.h"
 
 namespace kelp::analysis {
 
@@ -13,7 +13,7 @@ using tessel::utility::Guid;
 
 class UpstreamWalk {
  public:
-  UpstreamWalk(const NodeGraph& graph, std::uint32_t effect_id, MixHashGuid& mix)
+  UpstreamWalk(const SegmentGraph& graph, std::uint32_t effect_id, MixHashGuid& mix)
       : graph_(graph), effect_id_(effect_id), mix_(mix) {}
 
   // From the output inwards: what comes before the effect is met stands downstream of it. The Guid
@@ -42,7 +42,7 @@ class UpstreamWalk {
   }
 
  private:
-  const NodeGraph& graph_;
+  const SegmentGraph& graph_;
   const std::int64_t effect_id_;
   MixHashGuid& mix_;
 };
@@ -55,7 +55,7 @@ Guid GetUpstreamIdentifier(HX_InData* host_in, HX_OutData* host_out) {
   const ScopedSuite<HX_UtilitySuite> utility(context, HX_UTILITY_SUITE_VERSION_3);
   const ScopedSuite<HX_SequenceInfoSuite> sequence(context, HX_SEQUENCE_INFO_SUITE_VERSION_2);
   const ScopedSuite<HX_StringSuite1> strings(context);
-  const NodeGraph graph(*segments, *strings);
+  const SegmentGraph graph(*segments, *strings);
   const NodeReference clip = graph.ClipNode(host_in->effect_ref, *sequence, *utility);
   if (!clip) return {};
   std::uint32_t effect_id = 0;

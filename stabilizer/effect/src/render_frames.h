@@ -117,9 +117,9 @@ class ClipFrames final : public SourceFrames<Pixel> {
 
 // What the host's own operations do for a render.
 template <class Pixel>
-class HostOperations final : public WorldOperations<Pixel> {
+class SuiteOperations final : public WorldOperations<Pixel> {
  public:
-  explicit HostOperations(const HostContext& context) : context_(context) {}
+  explicit SuiteOperations(const HostContext& context) : context_(context) {}
 
   void TransferBehind(const WorldX<Pixel>& from, int x, int y, WorldX<Pixel>& to) override {
     const HX_World source = world_of(from);

@@ -1,3 +1,5 @@
+#include "stabilizer/effect/src/render_service.h"
+
 #include <algorithm>
 #include <vector>
 
@@ -9,12 +11,9 @@
 #include "platform/hx/hx_exports.h"
 #include "stabilizer/effect/src/fcd_table.h"
 #include "stabilizer/effect/src/parameter_table.h"
-#include "stabilizer/effect/src/stabilizer_effect.h"
 #include "stabilizer/render/cp_warper_warps.h"
 #include "stabilizer/render/frame_renderer.h"
 
-// StabilizerEffect's renders. Each works on the state of its own thread's instance, which took over
-// what the user interface published before the frame was set up.
 namespace kelp::effect {
 
 using analysis::FrameStatus;
@@ -102,85 +101,74 @@ class DirectRender {
 
 }  // namespace
 
-Renderer StabilizerEffect::MakeRenderer(const StabilizerState& state) const {
-  const HX_InData& in = *context().in;
-  const double pixel_aspect = static_cast<double>(state.solve_result->warper->frameWidth()) /
-                              std::max(state.source.width, std::int32_t{1});
+Renderer RendererOf(const HX_InData& in, const StabilizerState& state) {
+  const auto& warper = state.solve_result->warper;
+  const double pixel_aspect =
+      static_cast<double>(warper->frameWidth()) / std::max(state.source.width, std::int32_t{1});
   return marrow::render::makeRenderer(
-      CPWarperWarps(state.solve_result->warper),
-      static_cast<float>(ValueOfRatio(in.downsample_x) / pixel_aspect),
+      CPWarperWarps(warper), static_cast<float>(ValueOfRatio(in.downsample_x) / pixel_aspect),
       static_cast<float>(ValueOfRatio(in.downsample_y)));
 }
 
-OutputRect StabilizerEffect::SetUpOutput() {
-  const OutputRect input = InputRect(*context().in);
-  const auto framing = static_cast<Framing>(GetPopupParam(kFramingIndex));
-  const StabilizerState* const state = GetState();
-  if (IsOneByOne() || !state || !state->solve_result->warper || crops(framing) ||
-      !IsRenderableFrame()) {
+OutputRect RenderService::SetUpOutput() {
+  const HX_InData& in = *context_.in;
+  const OutputRect input = InputRect(in);
+  const auto framing = static_cast<Framing>(effect_.GetPopupParam(kFramingIndex));
+  const StabilizerState* const state = effect_.GetState();
+  if (effect_.IsOneByOne() || !state || !state->solve_result->warper || crops(framing) ||
+      !effect_.IsRenderableFrame()) {
     return input;
   }
-  return setupOutputRect(framing, MakeRenderer(*state), input.width, input.height);
-}
-
-void StabilizerEffect::PrepareFrame() {
-  if (StabilizerState* const state = GetState()) state->TakeOver();
-  const OutputRect output = SetUpOutput();
-  context().out->width = output.width;
-  context().out->height = output.height;
-  context().out->origin_x = output.origin_x;
-  context().out->origin_y = output.origin_y;
+  return setupOutputRect(framing, RendererOf(in, *state), input.width, input.height);
 }
 
 // -- The planned path --
 
-std::int64_t StabilizerEffect::PlanMargin(const StabilizerState& state) {
-  const EffectParameters params(*this);
+std::int64_t RenderService::PlanMargin(const StabilizerState& state) {
+  const EffectParameters params(effect_);
   return std::max<std::int64_t>(MarginInFrames(params, state.FrameRate()),
                                 deblurReach(GetRenderSettings(params).deblur));
 }
 
-FrameClock StabilizerEffect::ClockOf(const StabilizerState& state) {
-  const analysis::JobInput present = analysis::ReadJobInput(context().in, context().out);
+FrameClock RenderService::ClockOf(const StabilizerState& state) {
+  const analysis::JobInput present = analysis::ReadJobInput(context_.in, context_.out);
+  const analysis::JobInput& analysed = state.result->job_input;
   const std::int64_t start = analysis::FloorSteps(present.StartTime, present.StepTime);
-  return {analysis::CountsFields(state.result->job_input) ? 2 * start : start,
-          analysis::RowDuration(state.result->job_input)};
+  return {analysis::CountsFields(analysed) ? 2 * start : start, analysis::RowDuration(analysed)};
 }
 
-void StabilizerEffect::PlanFrame() {
-  if (!context().extra) return;
-  auto& plan = *static_cast<HX_PlanExtra*>(context().extra);
-  const HX_InData& in = *context().in;
+void RenderService::Plan(HX_PlanExtra& plan) {
+  const HX_InData& in = *context_.in;
   plan.solid = plan.may_exceed = 0;
   HX_CheckoutResult input{};
   const auto order_input = [&](std::int32_t id, const HX_RenderRequest& request) {
     ThrowIfFailed(plan.checkout_layer(in.effect_ref, 0, id, &request, in.current_time, in.time_step,
                                       in.time_scale, &input));
   };
-  if (IsOneByOne()) {
+  if (effect_.IsOneByOne()) {
     order_input(0, plan.request);
     plan.result_rect = input.result_rect;
     plan.full_rect = input.full_rect;
     return;
   }
-  if (!GetState()) CreateStateInHandle(in.instance_handle, true);
-  AttachSharedData(true);
-  StabilizerState& state = *GetState();
+  if (!effect_.GetState()) effect_.CreateStateInHandle(in.instance_handle, true);
+  effect_.AttachSharedData(true);
+  StabilizerState& state = *effect_.GetState();
   state.TakeOver();
 
   const OutputRect layer = InputRect(in);
   const HX_RenderRequest whole{{0, 0, layer.width, layer.height}, plan.request.bit_depth};
-  const CurrentFrame current = GetCurrentFrame(true);
+  const CurrentFrame current = effect_.GetCurrentFrame(true);
   state.planned_input = current.valid ? static_cast<std::int32_t>(current.frame) : 0;
-  state.planned_warp = current.valid && IsRenderableFrame();
+  state.planned_warp = current.valid && effect_.IsRenderableFrame();
   if (state.planned_warp) {
     const FrameClock clock = ClockOf(state);
     const std::int64_t margin = PlanMargin(state);
+    const marrow::tracking::AllFeatures& table = state.table();
     const std::int64_t first =
-        std::max<std::int64_t>({current.frame - margin, state.table().first_frame, 0});
-    const std::int64_t end =
-        std::min<std::int64_t>(current.frame + margin + 1,
-                               std::int64_t{state.table().first_frame} + state.table().frame_count);
+        std::max<std::int64_t>({current.frame - margin, table.first_frame, 0});
+    const std::int64_t end = std::min<std::int64_t>(
+        current.frame + margin + 1, std::int64_t{table.first_frame} + table.frame_count);
     for (std::int64_t frame = first; frame < end; ++frame) {
       const HostTime at = clock.At(frame);
       ThrowIfFailed(plan.checkout_layer(in.effect_ref, 0, static_cast<std::int32_t>(frame), &whole,
@@ -193,7 +181,7 @@ void StabilizerEffect::PlanFrame() {
   const OutputRect output = SetUpOutput();
   plan.full_rect = {-output.origin_x, -output.origin_y, output.width - output.origin_x,
                     output.height - output.origin_y};
-  if (crops(static_cast<Framing>(GetPopupParam(kFramingIndex)))) {
+  if (crops(static_cast<Framing>(effect_.GetPopupParam(kFramingIndex)))) {
     plan.result_rect = plan.full_rect;
     plan.may_exceed = 1;
   } else {
@@ -201,58 +189,57 @@ void StabilizerEffect::PlanFrame() {
   }
 }
 
-void StabilizerEffect::RenderPlannedFrame() {
-  if (!context().extra) return;
-  const auto& extra = *static_cast<const HX_RenderExtra*>(context().extra);
+void RenderService::RenderPlanned(const HX_RenderExtra& extra) {
   const std::int32_t depth = extra.request.bit_depth;
   if (depth != 8 && depth != 16 && depth != 32) return;
   HX_World* output = nullptr;
-  ThrowIfFailed(extra.checkout_output(context().in->effect_ref, &output));
-  const StabilizerState* const state = GetState();
-  PlannedFrames frames(context(), state && !IsOneByOne() ? state->planned_input : 0);
+  ThrowIfFailed(extra.checkout_output(context_.in->effect_ref, &output));
+  const StabilizerState* const state = effect_.GetState();
+  PlannedFrames frames(context_, state && !effect_.IsOneByOne() ? state->planned_input : 0);
   Render(frames, *output, depth, state && state->planned_warp);
 }
 
 // -- The direct path --
 
-void StabilizerEffect::RenderFrame() {
-  if (!context().output) return;
-  const DirectRender render(context());
-  DirectFrames frames(context(), [this] { return ClockOf(*GetState()); });
-  Render(frames, *context().output, context().output->flags & HX_WORLD_DEEP ? 16 : 8, true);
+void RenderService::RenderDirect(HX_World& output) {
+  const DirectRender render(context_);
+  DirectFrames frames(context_, [this] { return ClockOf(*effect_.GetState()); });
+  Render(frames, output, output.flags & HX_WORLD_DEEP ? 16 : 8, true);
 }
 
 // -- What both draw --
 
-void StabilizerEffect::Render(RenderFrames& frames, HX_World& output, std::int32_t depth,
-                              bool may_warp) {
-  const auto pass_through = [&] { CopyInput(context(), *frames.Input(), output, depth); };
-  if (IsOneByOne()) return pass_through();
-  if (ShowsOverlay()) {
+void RenderService::Render(RenderFrames& frames, HX_World& output, std::int32_t depth,
+                           bool may_warp) {
+  const auto pass_through = [&] { CopyInput(context_, *frames.Input(), output, depth); };
+  if (effect_.IsOneByOne()) return pass_through();
+  if (effect_.ShowsOverlay()) {
     pass_through();
-    return analysis::effect::AnalysisUIData(*this).Draw({}, {}, output);
+    return analysis::effect::AnalysisUIData(effect_).Draw({}, {}, output);
   }
-  const StatusRecord record = GetStatusRecord();
+  const StatusRecord record = effect_.GetStatusRecord();
   bool stabilized = false;
-  if (may_warp && IsRenderableFrame()) {
+  if (may_warp && effect_.IsRenderableFrame()) {
     ForDepth(depth,
              [&](auto pixel) { stabilized = RenderStabilized<decltype(pixel)>(frames, output); });
   }
   if (!stabilized) pass_through();
   if (stabilized && record.status == FrameStatus::Ready) return;
-  if (!IsBannerHidden()) analysis::effect::DrawBanner(*this, record, output);
+  if (!effect_.IsBannerHidden()) analysis::effect::DrawBanner(effect_, record, output);
 }
 
 template <class Pixel>
-bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) {
-  const StabilizerState& state = *GetState();
-  const CurrentFrame current = GetCurrentFrame(true);
-  const std::int64_t row = current.frame - state.table().first_frame;
-  if (!state.solve_result->warper || !current.valid || row < 0) return false;
+bool RenderService::RenderStabilized(RenderFrames& frames, HX_World& output) {
+  const StabilizerState& state = *effect_.GetState();
+  const boost::shared_ptr<const SolveResult> solve = state.solve_result;
+  const CurrentFrame current = effect_.GetCurrentFrame(true);
+  const std::int32_t first_frame = state.table().first_frame;
+  const std::int64_t row = current.frame - first_frame;
+  if (!solve->warper || !current.valid || row < 0) return false;
   const auto frame = static_cast<std::size_t>(row);
-  if (frame >= state.solve_result->warper->frameWarpCount()) return false;
+  if (frame >= solve->warper->frameWarpCount()) return false;
 
-  const EffectParameters params(*this);
+  const EffectParameters params(effect_);
   RenderSettings settings = GetRenderSettings(params);
   WorldX<Pixel> pixels = PixelsOf<Pixel>(output);
   if (!(settings.additional_scale > 0)) {  // a picture of no size
@@ -263,23 +250,21 @@ bool StabilizerEffect::RenderStabilized(RenderFrames& frames, HX_World& output) 
   settings.shift_x = static_cast<double>(output.origin_x) + setup.origin_x;
   settings.shift_y = static_cast<double>(output.origin_y) + setup.origin_y;
   settings.synthesis_range = MarginInFrames(params, state.FrameRate());
-  Renderer renderer = MakeRenderer(state);
-  ClipFrames<Pixel> clip(frames, state.table().first_frame);
-  HostOperations<Pixel> operations(context());
-  renderFrame(CPWarperWarps(state.solve_result->warper), state.solve_result->crop.get(), settings,
-              renderer, frame, clip, operations, pixels);
-  if (!crops(settings.framing)) SendPolygon(state, frame, renderer, settings, setup);
+  const CPWarperWarps warps(solve->warper);
+  Renderer renderer = RendererOf(*context_.in, state);
+  ClipFrames<Pixel> clip(frames, first_frame);
+  SuiteOperations<Pixel> operations(context_);
+  renderFrame(warps, solve->crop.get(), settings, renderer, frame, clip, operations, pixels);
+  if (!crops(settings.framing)) {
+    SendPolygon(frame,
+                outlinePolygon(warps, frame, renderer, settings, setup.origin_x, setup.origin_y));
+  }
   return true;
 }
 
-void StabilizerEffect::SendPolygon(const StabilizerState& state, std::size_t frame,
-                                   const Renderer& renderer, const RenderSettings& settings,
-                                   const OutputRect& setup) {
-  const std::vector<float> polygon =
-      outlinePolygon(CPWarperWarps(state.solve_result->warper), frame, renderer, settings,
-                     setup.origin_x, setup.origin_y);
-  const ScopedSuite<HX_StabilizerHostSuite7> suite(context());
-  ThrowIfFailed(suite->SetFramePolygon(context().in->effect_ref,
+void RenderService::SendPolygon(std::size_t frame, const std::vector<float>& polygon) {
+  const ScopedSuite<HX_StabilizerHostSuite7> suite(context_);
+  ThrowIfFailed(suite->SetFramePolygon(context_.in->effect_ref,
                                        static_cast<std::uint32_t>(polygon.size() / 2),
                                        polygon.data(), static_cast<std::int32_t>(frame)));
 }

@@ -1,3 +1,5 @@
+#include "stabilizer/effect/src/solve_service.h"
+
 #include <boost/make_shared.hpp>
 #include <cstdio>
 #include <iterator>
@@ -15,11 +17,10 @@
 #include "platform/tessel/utility.h"
 #include "stabilizer/effect/src/parameter_rules.h"
 #include "stabilizer/effect/src/parameter_table.h"
+#include "stabilizer/effect/src/render_service.h"
 #include "stabilizer/effect/src/solve_hash.h"
-#include "stabilizer/effect/src/stabilizer_effect.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
 
-// What StabilizerEffect does about its solve: the idle step and the controls.
 namespace kelp::effect {
 
 using analysis::FrameStatus;
@@ -48,213 +49,101 @@ std::string MinutesAndSeconds(double seconds) {
   return text;
 }
 
-std::int32_t PopupOf(HX_ParamDef** params, ParamIndex index) {
-  return static_cast<std::int32_t>(ValueOf(*params[index]));
-}
-
 }  // namespace
 
-bool StabilizerEffect::ServiceAnalysis(bool from_render) {
-  if (const StabilizerState* const own = GetState()) {
-    if (own->keep_jobs) return false;
-    try {  // a block that could not be had when the instance came
-      AttachSharedData(true);
-    } catch (std::int32_t) {
-      ClearMessage(context());
-    }
-    // Before the analysis goes on: a host that never heard of it would not wait for it.
-    if (own->unpublished != FrameStatus::None) PublishStatus(own->unpublished);
-  }
-  if (AnalysisEffect::ServiceAnalysis(from_render)) return true;
-  StabilizerState* const state = GetState();
-  if (!state) {
-    PublishSharedData();
-    return false;
-  }
-  if (state->solver) {
-    const Solver::State status = state->solver->GetState();
-    if (status == Solver::finished || status == Solver::failed) FinishSolve(*state);
-    if (status != Solver::running && status != Solver::failed) {
-      PublishSharedData();
-      return false;
-    }
-  }
-  CheckSolveParams(*state);
-  if (StartSolveIfNeeded(*state)) {
-    PublishStatus(state->SolveProgressStatus());
-    ForceRerender(context());
-    return true;
-  }
-  if (context().params) {
-    UpdateStartStopButtonEnablement(!IsAnalysisCurrent(state), false, nullptr);
-    if (state->solver) ShowSolveProgress(*state);
-  }
-  PublishSharedData();
-  return true;
-}
-
-void StabilizerEffect::CheckSolveParams(StabilizerState& state) {
-  const auto status = state.SolveStatus();
-  if (state.analyzer || (status != Solver::finished && status != Solver::failed)) return;
-  const SourceShape present = ShapeOf(*context().in);
-  if (!present.SameSize(state.source)) {
-    ReportSizeMismatch(state);
-    state.needs_solve = false;
+void SolveService::CheckParams() {
+  const auto status = state_.SolveStatus();
+  if (state_.analyzer || (status != Solver::finished && status != Solver::failed)) return;
+  const SourceShape present = ShapeOf(*context_.in);
+  if (!present.SameSize(state_.source)) {
+    ReportSizeMismatch();
+    state_.needs_solve = false;
     return;
   }
   // The tracks are in the source's pixels, whatever their aspect is said to be.
-  state.source = present;
+  state_.source = present;
 
-  const EffectParameters params(*this);
-  const SolverParamsRecord record = GetSolverParams(params, state.source, state.FrameRate());
+  const EffectParameters params(effect_);
+  const SolverParamsRecord record = GetSolverParams(params, state_.source, state_.FrameRate());
   const auto framing = static_cast<Framing>(params.GetPopupParam(kFramingIndex));
-  const auto deletions = analysis::effect::ReadDeletedTrackPoints(*this);
-  bool needed = state.needs_solve && state.has_frames();
-  if (SolveHash(record) != state.solve_result->solve_hash) {
+  const auto deletions = analysis::effect::ReadDeletedTrackPoints(effect_);
+  bool needed = state_.needs_solve && state_.has_frames();
+  if (SolveHash(record) != state_.solve_result->solve_hash) {
     needed = true;
-  } else if (deletions && !state.WasSolvedWithout(*deletions)) {
-    needed = state.subsequent_solve = true;
+  } else if (deletions && !state_.WasSolvedWithout(*deletions)) {
+    needed = state_.subsequent_solve = true;
   } else if (!needed && crops(framing)) {
-    needed = CropHash(record) != state.solve_result->crop_hash;
+    needed = CropHash(record) != state_.solve_result->crop_hash;
   } else if (!needed && status == Solver::finished) {
-    needed = MarginInFrames(params, state.FrameRate()) > state.FrameMapRadius();
+    needed = MarginInFrames(params, state_.FrameRate()) > state_.FrameMapRadius();
   }
   if (!needed) return;
-  const bool known = state.needs_solve;
-  state.needs_solve = true;
-  PublishStatus(state.SolveProgressStatus());
-  if (!known) ForceRerender(context());
+  const bool known = state_.needs_solve;
+  state_.needs_solve = true;
+  effect_.PublishStatus(state_.SolveProgressStatus());
+  if (!known) ForceRerender(context_);
 }
 
-bool StabilizerEffect::StartSolveIfNeeded(StabilizerState& state) {
-  if (!state.needs_solve || !state.has_frames()) return false;
-  const EffectParameters params(*this);
-  const bool started = state.StartSolve(
-      GetSolverParams(params, state.source, state.FrameRate()),
-      MarginInFrames(params, state.FrameRate()), analysis::effect::ReadDeletedTrackPoints(*this),
+bool SolveService::StartIfNeeded() {
+  if (!state_.needs_solve || !state_.has_frames()) return false;
+  const EffectParameters params(effect_);
+  const bool started = state_.StartSolve(
+      GetSolverParams(params, state_.source, state_.FrameRate()),
+      MarginInFrames(params, state_.FrameRate()), analysis::effect::ReadDeletedTrackPoints(effect_),
       [this]() -> boost::function<void()> {
-        const auto notifier = boost::make_shared<const SolveNotifier>(context());
+        const auto notifier = boost::make_shared<const SolveNotifier>(context_);
         return [notifier] { (*notifier)(); };
       });
-  if (started && !state.first_analysis) ShowInfoText(context(), nullptr, nullptr);
+  if (started && !state_.first_analysis) ShowInfoText(context_, nullptr, nullptr);
   return started;
 }
 
-void StabilizerEffect::FinishSolve(StabilizerState& state) {
-  if (state.solver->GetState() == Solver::failed && state.solver->OutOfMemory()) {
-    ReportOutOfMemory();
+void SolveService::Finish() {
+  if (state_.solver->GetState() == Solver::failed && state_.solver->OutOfMemory()) {
+    effect_.ReportOutOfMemory();
   }
-  state.TakeSolve();
+  state_.TakeSolve();
   const FrameStatus status =
-      state.phase == SolvePhase::Solved ? FrameStatus::Ready : FrameStatus::SolveFailed;
-  state.unpublished = status;  // whoever waits for the results must learn of them, come what may
-  const bool first = std::exchange(state.first_analysis, false);
-  RefreshParams();
-  RefreshAllWindows(context());
+      state_.phase == SolvePhase::Solved ? FrameStatus::Ready : FrameStatus::SolveFailed;
+  state_.unpublished = status;  // whoever waits for the results must learn of them, come what may
+  const bool first = std::exchange(state_.first_analysis, false);
+  effect_.RefreshParams();
+  RefreshAllWindows(context_);
   if (first) {
     const std::string time = MinutesAndSeconds(
-        HighPrecisionTime::Seconds(state.progress.start_tick, HighPrecisionTime::Now()));
-    ShowInfoText(context(), GetString(context(), kStringFinished), time.c_str());
+        HighPrecisionTime::Seconds(state_.progress.start_tick, HighPrecisionTime::Now()));
+    ShowInfoText(context_, GetString(context_, kStringFinished), time.c_str());
   }
-  PublishStatus(status);
+  effect_.PublishStatus(status);
 }
 
-void StabilizerEffect::ReportSizeMismatch(StabilizerState& state) {
-  const SourceShape present = ShapeOf(*context().in);
-  const bool told = state.reported_source.SameSize(present);
-  if (told || IsOneByOne() || !state.has_frames()) return;
-  state.reported_source = present;
-  analysis::ReportSizeMismatch(context().in, context().out, kEffectName, state.source, present,
+void SolveService::ReportSizeMismatch() {
+  const SourceShape present = ShapeOf(*context_.in);
+  const bool told = state_.reported_source.SameSize(present);
+  if (told || effect_.IsOneByOne() || !state_.has_frames()) return;
+  state_.reported_source = present;
+  analysis::ReportSizeMismatch(context_.in, context_.out, kEffectName, state_.source, present,
                                analysis::AfterReport::GoOn);
 }
 
-// -- The controls --
-
-void StabilizerEffect::RefreshParams() {
-  AnalysisEffect::RefreshParams();
-  HX_ParamDef** const params = context().params;
-  if (!params) return;
-  const auto enable = [this](std::int32_t index, bool enabled) {
-    UpdateParamUI(context(), index, {enabled, nullptr});
-  };
-  StabilizerState* const state = GetState();
-  const bool no_motion = PopupOf(params, kResultIndex) == static_cast<int>(Result::no_motion);
-  const auto framing = static_cast<Framing>(PopupOf(params, kFramingIndex));
-  const auto method = static_cast<Method>(PopupOf(params, kMethodIndex));
-  const bool auto_scales = framing == Framing::crop_auto_scale;
-  enable(kSmoothnessIndex, !no_motion);
-  if (state && crops(framing)) ShowAutoScale(*state);
-  if (state && !state->analyzer) ShowSolveProgress(*state);
-  enable(kCropLessSmoothMoreIndex, crops(framing) && !no_motion);
-  for (const std::int32_t index :
-       {kAutoScaleGroupIndex, kMaximumScaleIndex, kActionSafeMarginIndex}) {
-    enable(index, auto_scales);
-  }
-  enable(kRollingShutterRippleIndex,
-         method == Method::perspective || method == Method::subspace_warp);
-  for (std::int32_t index = kSynthesisInputRangeIndex; index <= kSynthesisBottomIndex; ++index) {
-    enable(index, framing == Framing::synthesize_edges);
-  }
-  if (state) CheckSolveParams(*state);
-  ForceRerender(context());
-}
-
-void StabilizerEffect::ShowSolveProgress(const StabilizerState& state) {
+void SolveService::ShowProgress() {
   static constexpr const char* kDots[] = {".  ", ".. ", "...", " ..", "  .", "   "};
-  std::string name = GetString(context(), kStringStabilization);
-  if (state.solver) name += kDots[state.solver->GetPollCount() % std::size(kDots)];
-  UpdateParamUI(context(), kStabilizationGroupIndex, {std::nullopt, name.c_str()});
+  std::string name = GetString(context_, kStringStabilization);
+  if (state_.solver) name += kDots[state_.solver->GetPollCount() % std::size(kDots)];
+  UpdateParamUI(context_, kStabilizationGroupIndex, {std::nullopt, name.c_str()});
 }
 
-void StabilizerEffect::ShowAutoScale(const StabilizerState& state) {
-  const SolveResult& solve = *state.solve_result;
+void SolveService::ShowAutoScale() {
+  const SolveResult& solve = *state_.solve_result;
   if (!solve.warper || !solve.crop || solve.crop->rects.empty()) return;
-  Renderer scratch = MakeRenderer(state);
-  const double zoom = state.GetZoom(EffectParameters(*this), scratch, true, false);
+  Renderer scratch = RendererOf(*context_.in, state_);
+  const double zoom = state_.GetZoom(EffectParameters(effect_), scratch, true, false);
   const std::string text =
       tessel::utility::ReplaceInString(tessel::config::Localizer::Localize(kAutoScaleReadout),
                                        tessel::utility::NumberToString(zoom * 100, 1));
   char name[kHostTextSize];
-  ConvertToHostText(context(), tessel::utility::ToUTF16(text), name);
-  UpdateParamUI(context(), kAutoScaleGroupIndex, {std::nullopt, name});
-}
-
-// -- What the analysis tells and asks --
-
-void StabilizerEffect::RestartAnalysis() {
-  TeardownInstance();
-  CreateInstanceState(false);
-  StartAnalysis();
-  PublishStatus(FrameStatus::AnalysisInProgress);
-}
-
-void StabilizerEffect::DropSolveJob() {
-  if (StabilizerState* const state = GetState()) state->solver.reset();
-}
-
-bool StabilizerEffect::IsBusy() {
-  const StabilizerState* const state = GetState();
-  return AnalysisEffect::IsBusy() ||
-         (state && ((state->has_frames() && state->needs_solve) || state->IsWorkingOnResults()));
-}
-
-void StabilizerEffect::MarkNeedsSolve() {
-  StabilizerState* const state = GetState();
-  if (!state) return;
-  state->needs_solve = true;
-  state->subsequent_solve = false;
-}
-
-void StabilizerEffect::MarkAnalysisFailed() {
-  if (StabilizerState* const state = GetState()) state->phase = SolvePhase::AnalysisFailed;
-}
-
-void StabilizerEffect::PublishStatus(FrameStatus status) {
-  StabilizerState* const state = GetState();
-  if (state) state->unpublished = status;
-  PublishSharedData();
-  AnalysisEffect::PublishStatus(status);
-  if (state) state->unpublished = FrameStatus::None;
+  ConvertToHostText(context_, tessel::utility::ToUTF16(text), name);
+  UpdateParamUI(context_, kAutoScaleGroupIndex, {std::nullopt, name});
 }
 
 }  // namespace kelp::effect

@@ -9,14 +9,18 @@
 #include "analysis/effect/effect_parameters.h"
 #include "analysis/src/job_registry.h"
 #include "effect/effect_globals.h"
+#include "effect/handle.h"
+#include "effect/host_requests.h"
 #include "effect/host_text.h"
 #include "effect/parameter_row.h"
 #include "stabilizer/effect/src/instance_handle.h"
 #include "stabilizer/effect/src/parameter_table.h"
+#include "stabilizer/effect/src/render_service.h"
+#include "stabilizer/effect/src/shared_service.h"
+#include "stabilizer/effect/src/solve_service.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
+#include "stabilizer/effect/src/stored_service.h"
 
-// The plug-in's life, its parameters, and the state of an instance. The idle step is in
-// solve_service.cpp, the renders in render_service.cpp, what they share in shared_service.cpp.
 namespace kelp::effect {
 
 using analysis::FrameStatus;
@@ -39,6 +43,10 @@ ParameterTexts& TextsOf(const HostContext& context) {
                          })});
   }
   return kept->texts;
+}
+
+std::int32_t PopupOf(HX_ParamDef** params, ParamIndex index) {
+  return static_cast<std::int32_t>(ValueOf(*params[index]));
 }
 
 // With the layer's.
@@ -176,6 +184,203 @@ void StabilizerEffect::CreateInstanceState(bool render_copy) {
   DetachSharedData();
   AnalysisEffect::CreateInstanceState(render_copy);
   AttachSharedData(render_copy);
+}
+
+// A flattened instance takes the place of the live one.
+void StabilizerEffect::FlattenInstance() {
+  HX_InData& in = *context().in;
+  const HX_Handle live = in.instance_handle;
+  if (!live || InspectInstance(context(), live) != FlattenedInstance::Live) return;
+  OwnedHandle flat(*in.cb, FlattenedHandle(context(), GetState()));
+  {
+    // Locked before anything changes. An analysis goes on without the state: whoever asks for the
+    // same again finds its job.
+    const InstanceHandleLock header(context(), live);
+    DetachSharedData();
+    const std::unique_ptr<StabilizerState> state(std::exchange(header->state, nullptr));
+  }
+  in.instance_handle = context().out->instance_handle = flat.release();
+  in.cb->dispose_handle(live);
+}
+
+void StabilizerEffect::ReloadInstance() {
+  HX_InData& in = *context().in;
+  const HX_Handle stored = in.instance_handle;
+  if (!stored) return CreateInstanceState(true);
+  const FlattenedInstance kind = InspectInstance(context(), stored);
+  if (kind == FlattenedInstance::Live) return;
+  std::unique_ptr<StabilizerState> state = StateOfFlattened(context(), kind);
+  if (state) state->unpublished = UntoldStatus(*state, GetFloatParam(kAnalysisStatusCounterIndex));
+  OwnedHandle live(*in.cb, AllocateInstanceHandle(kLivePayloadLength));
+  {
+    const InstanceHandleLock header(context(), live.get());  // may throw, so ahead of the release
+    header->state = state.release();
+  }
+  in.instance_handle = context().out->instance_handle = live.release();
+  in.cb->dispose_handle(stored);
+  AttachSharedData(false);
+  const StabilizerState* const present = GetState();
+  if (present && present->unpublished != FrameStatus::None) PublishStatus(present->unpublished);
+  ForceRerender(context());
+}
+
+// -- The analysis and the solve made of it --
+
+bool StabilizerEffect::ServiceAnalysis(bool from_render) {
+  if (const StabilizerState* const own = GetState()) {
+    if (own->keep_jobs) return false;
+    try {  // a block that could not be had when the instance came
+      AttachSharedData(true);
+    } catch (std::int32_t) {
+      ClearMessage(context());
+    }
+    // Before the analysis goes on: a host that never heard of it would not wait for it.
+    if (own->unpublished != FrameStatus::None) PublishStatus(own->unpublished);
+  }
+  if (AnalysisEffect::ServiceAnalysis(from_render)) return true;
+  StabilizerState* const state = GetState();
+  if (!state) {
+    PublishSharedData();
+    return false;
+  }
+  SolveService solve(*this, *state);
+  if (state->solver) {
+    const Solver::State status = state->solver->GetState();
+    if (status == Solver::finished || status == Solver::failed) solve.Finish();
+    if (status != Solver::running && status != Solver::failed) {
+      PublishSharedData();
+      return false;
+    }
+  }
+  solve.CheckParams();
+  if (solve.StartIfNeeded()) {
+    PublishStatus(state->SolveProgressStatus());
+    ForceRerender(context());
+    return true;
+  }
+  if (context().params) {
+    UpdateStartStopButtonEnablement(!IsAnalysisCurrent(state), false, nullptr);
+    if (state->solver) solve.ShowProgress();
+  }
+  PublishSharedData();
+  return true;
+}
+
+void StabilizerEffect::RefreshParams() {
+  AnalysisEffect::RefreshParams();
+  HX_ParamDef** const params = context().params;
+  if (!params) return;
+  const auto enable = [this](std::int32_t index, bool enabled) {
+    UpdateParamUI(context(), index, {enabled, nullptr});
+  };
+  StabilizerState* const state = GetState();
+  const bool no_motion = PopupOf(params, kResultIndex) == static_cast<int>(Result::no_motion);
+  const auto framing = static_cast<Framing>(PopupOf(params, kFramingIndex));
+  const auto method = static_cast<Method>(PopupOf(params, kMethodIndex));
+  const bool auto_scales = framing == Framing::crop_auto_scale;
+  enable(kSmoothnessIndex, !no_motion);
+  if (state && crops(framing)) SolveService(*this, *state).ShowAutoScale();
+  if (state && !state->analyzer) SolveService(*this, *state).ShowProgress();
+  enable(kCropLessSmoothMoreIndex, crops(framing) && !no_motion);
+  for (const std::int32_t index :
+       {kAutoScaleGroupIndex, kMaximumScaleIndex, kActionSafeMarginIndex}) {
+    enable(index, auto_scales);
+  }
+  enable(kRollingShutterRippleIndex,
+         method == Method::perspective || method == Method::subspace_warp);
+  for (std::int32_t index = kSynthesisInputRangeIndex; index <= kSynthesisBottomIndex; ++index) {
+    enable(index, framing == Framing::synthesize_edges);
+  }
+  if (state) SolveService(*this, *state).CheckParams();
+  ForceRerender(context());
+}
+
+void StabilizerEffect::RestartAnalysis() {
+  TeardownInstance();
+  CreateInstanceState(false);
+  StartAnalysis();
+  PublishStatus(FrameStatus::AnalysisInProgress);
+}
+
+void StabilizerEffect::DropSolveJob() {
+  if (StabilizerState* const state = GetState()) state->solver.reset();
+}
+
+bool StabilizerEffect::IsBusy() {
+  const StabilizerState* const state = GetState();
+  return AnalysisEffect::IsBusy() ||
+         (state && ((state->has_frames() && state->needs_solve) || state->IsWorkingOnResults()));
+}
+
+void StabilizerEffect::MarkNeedsSolve() {
+  StabilizerState* const state = GetState();
+  if (!state) return;
+  state->needs_solve = true;
+  state->subsequent_solve = false;
+}
+
+void StabilizerEffect::MarkAnalysisFailed() {
+  if (StabilizerState* const state = GetState()) state->phase = SolvePhase::AnalysisFailed;
+}
+
+void StabilizerEffect::PublishStatus(FrameStatus status) {
+  StabilizerState* const state = GetState();
+  if (state) state->unpublished = status;
+  PublishSharedData();
+  AnalysisEffect::PublishStatus(status);
+  if (state) state->unpublished = FrameStatus::None;
+}
+
+// -- The block shared with renders --
+
+void StabilizerEffect::PublishSharedData() {
+  const StabilizerState* const state = GetState();
+  if (!state || !state->shared || state->keep_jobs) return;
+  const SolveResult& solve = *state->solve_result;
+  // The status asks the host, so it comes last and ahead of the lock.
+  const auto framing = static_cast<Framing>(GetPopupParam(kFramingIndex));
+  const bool gpu_allowed = solve.warper && framing != Framing::synthesize_edges &&
+                           (!crops(framing) || solve.crop) &&
+                           GetStatusForFrame(state->table().first_frame) == FrameStatus::Ready;
+  state->Publish(gpu_allowed);
+}
+
+void StabilizerEffect::AttachSharedData(bool skip_publish) {
+  StabilizerState* const state = GetState();
+  if (!state || state->shared) return;
+  AttachBlock(context(), *state);
+  if (!skip_publish) PublishSharedData();
+}
+
+bool StabilizerEffect::DetachSharedData() {
+  StabilizerState* const state = GetState();
+  return state && state->shared && DetachBlock(context(), *state);
+}
+
+// -- Renders --
+
+void StabilizerEffect::PrepareFrame() {
+  if (StabilizerState* const state = GetState()) state->TakeOver();
+  const OutputRect output = RenderService(*this).SetUpOutput();
+  context().out->width = output.width;
+  context().out->height = output.height;
+  context().out->origin_x = output.origin_x;
+  context().out->origin_y = output.origin_y;
+}
+
+void StabilizerEffect::PlanFrame() {
+  if (!context().extra) return;
+  RenderService(*this).Plan(*static_cast<HX_PlanExtra*>(context().extra));
+}
+
+void StabilizerEffect::RenderPlannedFrame() {
+  if (!context().extra) return;
+  RenderService(*this).RenderPlanned(*static_cast<const HX_RenderExtra*>(context().extra));
+}
+
+void StabilizerEffect::RenderFrame() {
+  if (!context().output) return;
+  RenderService(*this).RenderDirect(*context().output);
 }
 
 }  // namespace kelp::effect

@@ -1,17 +1,15 @@
 #pragma once
 
 #include "analysis/effect/analysis_effect.h"
-#include "stabilizer/effect/src/render_frames.h"
 #include "stabilizer/effect/src/stabilizer_state.h"
 #include "stabilizer/render/output_rect.h"
 
 namespace kelp::effect {
 
-using marrow::render::OutputRect;
-
-// The stabilizer: what follows an analysis. The start and the watch of a solve, whether a change
-// calls for a solve or for a new crop alone, the state of an instance and its handle, the block
-// shared with renders, and the renders themselves.
+// The stabilizer: what follows an analysis. Of its own it has the parameters, the statuses, and the
+// life of an instance and its handle; the rest is done by services: SolveService starts and watches
+// a solve, RenderService draws, shared_service.h has the block that renders share, and
+// stored_service.h what projects keep.
 class StabilizerEffect final : public analysis::effect::AnalysisEffect {
  public:
   explicit StabilizerEffect(const HostContext& context) noexcept : AnalysisEffect(context) {}
@@ -67,37 +65,6 @@ class StabilizerEffect final : public analysis::effect::AnalysisEffect {
 
   // An instance out of a flattened handle, or a render's empty copy out of none.
   virtual void ReloadInstance();
-
- private:
-  // That of a restored instance, where the host was not told it when the instance was saved.
-  analysis::FrameStatus UntoldStatus(const StabilizerState& state);
-  // Compares what is stored with what the parameters ask for. None of them is supervised, so this
-  // is where a slider's change takes effect.
-  void CheckSolveParams(StabilizerState& state);
-  // Whether it started one.
-  bool StartSolveIfNeeded(StabilizerState& state);
-  void FinishSolve(StabilizerState& state);
-  // On the name of the Stabilization group: dots that move while a solve is at work.
-  void ShowSolveProgress(const StabilizerState& state);
-  // On the name of the Auto-scale group.
-  void ShowAutoScale(const StabilizerState& state);
-  // Once for each size.
-  void ReportSizeMismatch(StabilizerState& state);
-
-  // The renderer of the state's warps at the render's scale.
-  Renderer MakeRenderer(const StabilizerState& state) const;
-  // The output of a render of the whole frame: that of the layer unless the frame can be rendered
-  // and may reach beyond it.
-  OutputRect SetUpOutput();
-  // Frames on either side of the current one that a plan orders.
-  std::int64_t PlanMargin(const StabilizerState& state);
-  FrameClock ClockOf(const StabilizerState& state);
-  // Without may_warp, and where the frame can't be rendered, the input is drawn.
-  void Render(RenderFrames& frames, HX_World& output, std::int32_t depth, bool may_warp);
-  template <class Pixel>
-  bool RenderStabilized(RenderFrames& frames, HX_World& output);
-  void SendPolygon(const StabilizerState& state, std::size_t frame, const Renderer& renderer,
-                   const RenderSettings& settings, const OutputRect& setup);
 };
 
 }  // namespace kelp::effect

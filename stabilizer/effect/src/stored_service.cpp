@@ -1,23 +1,18 @@
+#include "stabilizer/effect/src/stored_service.h"
+
 #include <cmath>
 #include <cstring>
-#include <memory>
 #include <string>
-#include <utility>
 
 #include "analysis/host/video_segment_render_suite_job.h"
 #include "analysis/src/state_errors.h"
-#include "effect/host_requests.h"
 #include "effect/suite.h"
 #include "platform/tessel/debug.h"
 #include "platform/tessel/filesupport.h"
-#include "stabilizer/effect/src/instance_handle.h"
-#include "stabilizer/effect/src/parameter_table.h"
-#include "stabilizer/effect/src/stabilizer_effect.h"
 #include "stabilizer/effect/src/stabilizer_strings.h"
 #include "stabilizer/effect/src/state_format/state_reader.h"
 #include "stabilizer/effect/src/state_format/state_writer.h"
 
-// StabilizerEffect and what projects keep of an instance.
 namespace kelp::effect {
 
 using analysis::AfterReport;
@@ -104,71 +99,40 @@ void KeepJobThatCanGoOn(const HostContext& context, StabilizerState& state) {
 
 }  // namespace
 
-// The project's parameters tell what was under way, or could not be told, when it was saved.
-FrameStatus StabilizerEffect::UntoldStatus(const StabilizerState& state) {
-  if (state.analyzer || (state.has_frames() && state.needs_solve)) return FrameStatus::None;
-  const FrameStatus status = !state.has_frames()                 ? FrameStatus::PressAnalyze
-                             : state.phase == SolvePhase::Failed ? FrameStatus::SolveFailed
-                                                                 : FrameStatus::Ready;
-  const double counter = GetFloatParam(kAnalysisStatusCounterIndex);
-  const auto told = static_cast<FrameStatus>(std::llround(std::fmod(counter, 100)));
-  const bool idle = status == FrameStatus::PressAnalyze && told == FrameStatus::None;
-  return told == status || idle ? FrameStatus::None : status;
-}
-
-void StabilizerEffect::FlattenInstance() {
-  HX_InData& in = *context().in;
-  const HX_Handle live = in.instance_handle;
-  if (!live || InspectInstance(context(), live) != FlattenedInstance::Live) return;
-  const bool raw = KeepsPayloadRaw(context());
-  const StabilizerState* const present = GetState();
-  const std::string payload = present ? PayloadOf(*present, raw) : std::string();
-  OwnedHandle flat(*in.cb, NewInstanceHandle(context(), payload.size()));
+HX_Handle FlattenedHandle(const HostContext& context, const StabilizerState* state) {
+  const bool raw = KeepsPayloadRaw(context);
+  const std::string payload = state ? PayloadOf(*state, raw) : std::string();
+  OwnedHandle flat(*context.in->cb, NewInstanceHandle(context, payload.size()));
   {
-    const InstanceHandleLock header(context(), flat.get());
+    const InstanceHandleLock header(context, flat.get());
     header->flattened = 1;
     header->raw = raw ? 1 : 0;
     std::memcpy(&*header + 1, payload.data(), payload.size());
   }
-  {
-    // Locked before anything changes. An analysis goes on without the state: whoever asks for the
-    // same again finds its job.
-    const InstanceHandleLock header(context(), live);
-    DetachSharedData();
-    const std::unique_ptr<StabilizerState> state(std::exchange(header->state, nullptr));
-  }
-  in.instance_handle = context().out->instance_handle = flat.release();
-  in.cb->dispose_handle(live);
+  return flat.release();
 }
 
-void StabilizerEffect::ReloadInstance() {
-  HX_InData& in = *context().in;
-  const HX_Handle stored = in.instance_handle;
-  if (!stored) return CreateInstanceState(true);
-  const FlattenedInstance kind = InspectInstance(context(), stored);
-  if (kind == FlattenedInstance::Live) return;
-  std::unique_ptr<StabilizerState> state;
-  if (kind != FlattenedInstance::Nothing) {
-    state = std::make_unique<StabilizerState>(in, false);
-    try {
-      LoadInstance(context(), kind, *state);
-    } catch (const analysis::StateDeserializationFailed&) {
-      state = std::make_unique<StabilizerState>(in, false);
-    }
-    KeepJobThatCanGoOn(context(), *state);
-    state->unpublished = UntoldStatus(*state);
+std::unique_ptr<StabilizerState> StateOfFlattened(const HostContext& context,
+                                                  FlattenedInstance kind) {
+  if (kind == FlattenedInstance::Nothing) return nullptr;
+  auto state = std::make_unique<StabilizerState>(*context.in, false);
+  try {
+    LoadInstance(context, kind, *state);
+  } catch (const analysis::StateDeserializationFailed&) {
+    state = std::make_unique<StabilizerState>(*context.in, false);
   }
-  OwnedHandle live(*in.cb, AllocateInstanceHandle(kLivePayloadLength));
-  {
-    const InstanceHandleLock header(context(), live.get());  // may throw, so ahead of the release
-    header->state = state.release();
-  }
-  in.instance_handle = context().out->instance_handle = live.release();
-  in.cb->dispose_handle(stored);
-  AttachSharedData(false);
-  const StabilizerState* const present = GetState();
-  if (present && present->unpublished != FrameStatus::None) PublishStatus(present->unpublished);
-  ForceRerender(context());
+  KeepJobThatCanGoOn(context, *state);
+  return state;
+}
+
+FrameStatus UntoldStatus(const StabilizerState& state, double counter) {
+  if (state.analyzer || (state.has_frames() && state.needs_solve)) return FrameStatus::None;
+  const FrameStatus status = !state.has_frames()                 ? FrameStatus::PressAnalyze
+                             : state.phase == SolvePhase::Failed ? FrameStatus::SolveFailed
+                                                                 : FrameStatus::Ready;
+  const auto told = static_cast<FrameStatus>(std::llround(std::fmod(counter, 100)));
+  const bool idle = status == FrameStatus::PressAnalyze && told == FrameStatus::None;
+  return told == status || idle ? FrameStatus::None : status;
 }
 
 }  // namespace kelp::effect

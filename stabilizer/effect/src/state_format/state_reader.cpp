@@ -9,7 +9,7 @@
 #include "stabilizer/effect/src/state_format/format.h"
 #include "stabilizer/effect/src/state_format/job_json.h"
 #include "stabilizer/effect/src/state_format/solve_sections.h"
-#include "stabilizer/effect/src/state_format/track_table.h"
+#include "stabilizer/effect/src/state_format/stored_tracks.h"
 
 namespace kelp::effect {
 

@@ -1,4 +1,4 @@
-#include "analysis/src/node_graph.h"
+#include "analysis/src/segment_graph.h"
 
 #include <charconv>
 #include <utility>
@@ -45,8 +45,8 @@ void NodeReference::Reset() {
   if (node_ != 0) suite_->ReleaseNode(Detach());
 }
 
-NodeReference NodeGraph::ClipNode(HX_EffectRef effect, const HX_SequenceInfoSuite& sequence,
-                                  const HX_UtilitySuite& utility) const {
+NodeReference SegmentGraph::ClipNode(HX_EffectRef effect, const HX_SequenceInfoSuite& sequence,
+                                     const HX_UtilitySuite& utility) const {
   const SegmentsReference segments(sequence, effect);
   std::int32_t start = 0, count = 0;
   std::int64_t ticks = 0;
@@ -62,43 +62,43 @@ NodeReference NodeGraph::ClipNode(HX_EffectRef effect, const HX_SequenceInfoSuit
   return {segments_, node};
 }
 
-std::int32_t NodeGraph::OperatorCount(HX_Node node) const {
+std::int32_t SegmentGraph::OperatorCount(HX_Node node) const {
   std::int32_t count = 0;
   ThrowIfFailed(segments_.GetOperatorCount(node, &count));
   return count;
 }
 
-NodeReference NodeGraph::Operator(HX_Node node, std::int32_t index) const {
+NodeReference SegmentGraph::Operator(HX_Node node, std::int32_t index) const {
   HX_Node found = 0;
   ThrowIfFailed(segments_.GetOperator(node, index, &found));
   return {segments_, found};
 }
 
-std::int32_t NodeGraph::InputCount(HX_Node node) const {
+std::int32_t SegmentGraph::InputCount(HX_Node node) const {
   std::int32_t count = 0;
   ThrowIfFailed(segments_.GetInputCount(node, &count));
   return count;
 }
 
-NodeReference NodeGraph::Input(HX_Node node, std::int32_t index) const {
+NodeReference SegmentGraph::Input(HX_Node node, std::int32_t index) const {
   HX_Node found = 0;
   ThrowIfFailed(segments_.GetInput(node, index, &found));
   return {segments_, found};
 }
 
-HX_Guid NodeGraph::NodeGuid(HX_Node node) const {
+HX_Guid SegmentGraph::NodeGuid(HX_Node node) const {
   HX_Guid guid{};
   ThrowIfFailed(segments_.GetNodeGuid(node, &guid));
   return guid;
 }
 
-std::string NodeGraph::OperatorText(HX_Node effect_operator) const {
+std::string SegmentGraph::OperatorText(HX_Node effect_operator) const {
   HX_String text = nullptr;
   ThrowIfFailed(segments_.GetOperatorText(effect_operator, &text));
   return effect::TakeText(strings_, text);
 }
 
-std::int64_t NodeGraph::NumberProperty(HX_Node node, const char* key, bool* absent) const {
+std::int64_t SegmentGraph::NumberProperty(HX_Node node, const char* key, bool* absent) const {
   HX_String string = nullptr;
   const bool failed = segments_.GetProperty(node, key, &string) != HX_ERR_NONE;
   if (absent != nullptr) *absent = failed;

@@ -28,9 +28,9 @@ class NodeReference {
 };
 
 // The suites' part of the graph's walks. The suites are borrowed; functions throw the host's code.
-class NodeGraph {
+class SegmentGraph {
  public:
-  NodeGraph(const HX_VideoSegmentSuite5& segments, const HX_StringSuite1& strings)
+  SegmentGraph(const HX_VideoSegmentSuite5& segments, const HX_StringSuite1& strings)
       : segments_(segments), strings_(strings) {}
 
   // The node under the middle of the effect's layer; none if nothing stands there.

@@ -1,4 +1,4 @@
-#include "stabilizer/effect/src/state_format/track_table.h"
+#include "stabilizer/effect/src/state_format/stored_tracks.h"
 
 #include <algorithm>
 #include <cmath>
