@@ -13,6 +13,7 @@
 #include "stabilization/models/matrix3.h"
 #include "stabilization/solve_records.h"
 #include "stabilization/stabilizer_global.h"
+#include "stabilization/warp/var_vector.h"
 
 // Displacements and clips made by hand.
 namespace marrow::stabilization {
@@ -56,6 +57,19 @@ inline void expect_point_near(point2 actual, point2 expected, double tolerance) 
 
 inline point2 position(const track_sample& s) {
   return {s.x, s.y};
+}
+
+// A grid over a frame, its outermost vertices on the first and last pixels, each moved by `to`.
+template <class To>
+VarVector grid_over(int width, int height, int cols, int rows, To to) {
+  VarVector grid(cols, rows);
+  for (int v = 0; v < cols * rows; ++v) {
+    const point2 p =
+        to(point2{v % cols * (width - 1.0) / (cols - 1), v / cols * (height - 1.0) / (rows - 1)});
+    grid.values[2 * v] = p.x;
+    grid.values[2 * v + 1] = p.y;
+  }
+  return grid;
 }
 
 // A clip's tables with one slot for each track; no sample anywhere until a track is added.

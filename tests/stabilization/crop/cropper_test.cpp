@@ -16,19 +16,11 @@ using namespace marrow::stabilization;
 
 namespace {
 
-using motion = std::function<point2(double, double)>;
+using motion = std::function<point2(point2)>;
 
 boost::shared_ptr<const VarVector> warped(int width, int height, int cols, int rows,
                                           const motion& to) {
-  const auto warp = boost::make_shared<VarVector>(cols, rows);
-  for (int r = 0; r < rows; ++r) {
-    for (int c = 0; c < cols; ++c) {
-      const point2 p = to(c * (width - 1.0) / (cols - 1), r * (height - 1.0) / (rows - 1));
-      warp->values[2 * (r * cols + c)] = p.x;
-      warp->values[2 * (r * cols + c) + 1] = p.y;
-    }
-  }
-  return warp;
+  return boost::make_shared<VarVector>(grid_over(width, height, cols, rows, to));
 }
 
 boost::shared_ptr<const VarVector> full_hd(const motion& to) {
@@ -36,7 +28,7 @@ boost::shared_ptr<const VarVector> full_hd(const motion& to) {
 }
 
 motion shift(double dx, double dy) {
-  return [=](double x, double y) { return point2{x + dx, y + dy}; };
+  return [=](point2 p) { return point2{p.x + dx, p.y + dy}; };
 }
 
 frame_bounds bounds_of(const std::vector<boost::shared_ptr<const VarVector>>& warps) {
@@ -109,10 +101,10 @@ TEST(Cropper, WhatMakesTheWindowConstant) {
 }
 
 TEST(Cropper, RotatedFrame) {
-  const auto warp = full_hd([](double x, double y) {
-    const double c = std::cos(.02), s = std::sin(.02);
-    return point2{959.5 + c * (x - 959.5) - s * (y - 539.5),
-                  539.5 + s * (x - 959.5) + c * (y - 539.5)};
+  const auto warp = full_hd([](point2 p) {
+    const point2 middle = {959.5, 539.5};
+    const point2 turned = transform(similarity_matrix(1, .02, 0, 0), {p.x - 959.5, p.y - 539.5});
+    return point2{middle.x + turned.x, middle.y + turned.y};
   });
   const frame_bounds b = bounds_of({warp});
   cropper c(1, static_cast<std::uint64_t>(std::ceil(b.max_x - b.min_x)),
@@ -128,8 +120,8 @@ TEST(Cropper, RotatedFrame) {
 TEST(Cropper, FilledCellsGiveTheLargestRectangle) {
   // A diamond of half diagonal 20 about (20, 20): of the inscribed rectangles the square of half
   // side 10 is largest.
-  const auto diamond = warped(41, 41, 9, 9, [](double x, double y) {
-    return point2{20 + (x - 20) / 2 - (y - 20) / 2, 20 + (x - 20) / 2 + (y - 20) / 2};
+  const auto diamond = warped(41, 41, 9, 9, [](point2 p) {
+    return point2{20 + (p.x - p.y) / 2, (p.x + p.y) / 2};
   });
   cropper c(1, 40, 40);
   c.computeFrameRect(0, *diamond, {0, 0}, false);
@@ -141,8 +133,8 @@ TEST(Cropper, FoldedAndBrokenWarps) {
   const std::pair<motion, const char*> cases[] = {
       {shift(0, 0), ""},
       // The middle cell's centre drawn onto the top edge's line.
-      {[](double x, double) {
-         return point2{x, 50};
+      {[](point2 p) {
+         return point2{p.x, 50};
        },
        "Unknown cropping error 2"},
       {shift(0, -90), "Unknown cropping error 1"},

@@ -208,12 +208,8 @@ TEST(CPWarperTest, AFrameWithoutTracksHasNoPlace) {
 class FrameBoundsTest : public ::testing::Test {
  protected:
   void Store(const matrix3& m, point2 inner = {0, 0}) {
-    auto grid = boost::make_shared<VarVector>(4, 3);
-    for (int i = 0; i < 12; ++i) {
-      const point2 p = transform(m, {i % 4 * 30.0, i / 4 * 30.0});
-      grid->values[2 * i] = p.x;
-      grid->values[2 * i + 1] = p.y;
-    }
+    auto grid = boost::make_shared<VarVector>(
+        grid_over(91, 61, 4, 3, [&](point2 p) { return transform(m, p); }));
     grid->values[10] += inner.x;
     grid->values[11] += inner.y;
     warper_.storeFrameWarp(grid, false);

@@ -54,12 +54,10 @@ TEST(TriangleShapeTest, PutsTheFirstCornerFromTheOtherTwo) {
 
 // A grid of 30-pixel cells under m, and displacements all over it with targets off by up to 5.
 struct Scene {
-  Scene(int cols, int rows, const matrix3& m) : shape(2 * cols * rows) {
-    for (int v = 0; v < cols * rows; ++v) {
-      const point2 p = transform(m, {30.0 * (v % cols), 30.0 * (v / cols)});
-      shape[2 * v] = p.x;
-      shape[2 * v + 1] = p.y;
-    }
+  Scene(int cols, int rows, const matrix3& m)
+      : shape(grid_over(30 * cols - 29, 30 * rows - 29, cols, rows, [&](point2 p) {
+                return transform(m, p);
+              }).values) {
     std::mt19937 random(5);
     std::uniform_real_distribution<double> unit(0, 1);
     for (int i = 0; i < 40; ++i) {
