@@ -88,5 +88,31 @@ TEST(SmoothWindowsTest, WindowsAndTransitionsJoin) {
   }
 }
 
+// Without own motion every track stands still from window to window: a bridge takes over where the
+// frame before it left the tracks.
+TEST(SmoothWindowsTest, WithoutMotionTracksStandStillAcrossTheBridges) {
+  SolverParamsRecord parameters;
+  parameters.no_motion = true;
+  const solved_clip clip = solve_chain(parameters, [](std::size_t slot, int f) {
+    const point2 rest = scattered(slot), shift = shaken({0, 0}, f);
+    return point2{rest.x + shift.x, rest.y + shift.y};
+  });
+  ASSERT_EQ(clip.result, 1);
+  ASSERT_EQ(spans_of(clip.windows), "6 36;46 76;");
+  ASSERT_EQ(spans_of(clip.transitions), "solved 0 16;solved 36 56;solved 76 90;");
+  std::size_t steps = 0;
+  for (std::size_t f = 17; f < 90; ++f) {
+    if (f >= 46 && f < 56) continue;  // the second window's start has its own table
+    for (std::size_t s = 0; s < clip.global.feature_count; ++s) {
+      const track_sample &before = clip.global.output_at(f - 1, s),
+                         &at = clip.global.output_at(f, s);
+      if (before.status < 0 || at.status < 0) continue;
+      expect_point_near(position(at), position(before), 0.05);
+      ++steps;
+    }
+  }
+  EXPECT_GT(steps, 800u);
+}
+
 }  // namespace
 }  // namespace marrow::stabilization

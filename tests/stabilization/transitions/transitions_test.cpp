@@ -120,7 +120,7 @@ TEST(TransitionWindow, ShakyTracksComeOutSmoothAtAMinimumOfTheCost) {
         std::vector<double> moved = solved;
         if (k < solved.size()) moved[k] += sign * (k % 4 < 2 ? 1e-4 : 0.1);
         for (std::size_t f = 0; k >= solved.size() && f < 30; ++f) {
-          moved[4 * f + 2 + k % 2] += sign * 0.1 * (k % 4 < 2 ? 1.0 : f / 30.0);
+          moved[4 * f + 2 + k % 2] += sign * 0.01 * (k % 4 < 2 ? 1.0 : f / 30.0);
         }
         EXPECT_GT(plain_cost(s, moved, first), least) << k << ", from " << first;
       }
