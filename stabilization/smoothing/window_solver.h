@@ -56,7 +56,6 @@ class window_solver {
   bool HasOverlapSample(const active_track& track, std::size_t frame) const;
   const track_sample& OverlapSample(const active_track& track, std::size_t frame) const;
   std::size_t Feature(const active_track& track) const;
-  void Regularize();
   void BuildStructure();
   void AddBlock(std::size_t frame, std::size_t offset, const double* block, double factor);
   bool Solve();

@@ -2,64 +2,69 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/stabilization/displacement_lists.h"
+#include <functional>
+
+#include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
 
-const auto at_slot = [](double x) { return [x](int f) { return point2{x + f, 2.0 * f}; }; };
 const auto shifted = [](int, point2 p) { return point2{p.x + 10, p.y - 5}; };
 
-std::vector<double> weights_of(int first, int last, int frames) {
-  stabilizer_global global = empty_clip(1, frames);
-  add_track(global, 0, first, last, at_slot(3), shifted);
-  std::vector<double> weights;
-  for (const auto& list : blended_displacements(global, {}, {})) {
-    for (const Displacement& d : list) weights.push_back(d.weight);
-  }
-  return weights;
+// Of a slot: 100 pixels from its neighbours, moving by a pixel a frame.
+void add_moving(stabilizer_global& global, int slot, int first, int last) {
+  add_track(
+      global, slot, first, last,
+      [slot](int f) {
+        return point2{100.0 * slot + f, 2.0 * f};
+      },
+      shifted);
 }
 
-TEST(BlendedDisplacementsTest, WeightsOfWholeAndPassingTracks) {
-  EXPECT_EQ(weights_of(0, 300, 300), std::vector<double>(300, 1.0));
-  EXPECT_EQ(weights_of(0, 150, 150), std::vector<double>(150, 0.75));
-  const std::vector<double> passing = weights_of(10, 15, 300);
-  ASSERT_EQ(passing.size(), 5u);
-  const double expected[] = {.01, .02, .025, .02, .01};
-  for (int i = 0; i < 5; ++i) EXPECT_NEAR(passing[i], expected[i], 1e-15);
-  EXPECT_TRUE(weights_of(10, 14, 300).empty());
+// Each track has a record, linked to its neighbours and off its source by shift(frame), on exactly
+// the frames where alive(frame, slot).
+void expect_lists(const displacement_lists& lists, int slots,
+                  const std::function<bool(int, int)>& alive,
+                  const std::function<double(int)>& shift) {
+  const int frames = static_cast<int>(lists.size());
+  for (int f = 0; f < frames; ++f) {
+    std::vector<int> records(slots);
+    for (const Displacement& d : lists[f]) {
+      const int slot = d.track->feature;
+      ++records[slot];
+      ASSERT_EQ(d.sourceX, 100.0 * slot + f);
+      ASSERT_EQ(d.targetX, d.sourceX + shift(f));
+      for (const auto& [other, index] : {std::pair(f + 1, d.nextIndex), {f - 1, d.prevIndex}}) {
+        const bool there = other >= 0 && other < frames && alive(other, slot);
+        ASSERT_EQ(index >= 0, there) << "frame " << f << " slot " << slot;
+        if (there) {
+          ASSERT_EQ(lists[other][index].track, d.track);
+        }
+      }
+    }
+    for (int s = 0; s < slots; ++s) ASSERT_EQ(records[s], alive(f, s)) << f << " slot " << s;
+  }
 }
 
 TEST(BlendedDisplacementsTest, LinksFollowATrackThroughListsOfDifferentLength) {
-  stabilizer_global global = empty_clip(3, 20);
-  add_track(global, 0, 0, 8, at_slot(0), shifted);
-  add_track(global, 1, 0, 20, at_slot(100), shifted);
-  add_track(global, 2, 6, 20, at_slot(200), shifted);
-  const displacement_lists lists = blended_displacements(global, {}, {});
-  for (int f = 0; f < 20; ++f) {
-    for (const Displacement& d : lists[f]) {
-      ASSERT_EQ(d.sourceX, d.track->feature * 100.0 + f);
-      ASSERT_EQ(d.targetX, d.sourceX + 10);
-      ASSERT_EQ(d.nextIndex < 0, f + 1 == d.track->last);
-      ASSERT_EQ(d.prevIndex < 0, f == d.track->first);
-      if (d.nextIndex >= 0) {
-        ASSERT_EQ(lists[f + 1][d.nextIndex].track, d.track);
-      }
-      if (d.prevIndex >= 0) {
-        ASSERT_EQ(lists[f - 1][d.prevIndex].track, d.track);
-      }
-    }
-  }
+  const int lives[][2] = {{0, 8}, {0, 20}, {6, 20}, {9, 13}, {10, 15}};  // the fourth is too short
+  stabilizer_global global = empty_clip(5, 20);
+  for (int s = 0; s < 5; ++s) add_moving(global, s, lives[s][0], lives[s][1]);
+  expect_lists(
+      blended_displacements(global, {}, {}), 5,
+      [&](int f, int s) { return s != 3 && f >= lives[s][0] && f < lives[s][1]; },
+      [](int) { return 10; });
 }
 
-TEST(BlendedDisplacementsTest, TracksAreCutToTheirStabilizedSamples) {
+TEST(BlendedDisplacementsTest, TracksAreCutToTheirStabilizedSamplesAndFadeFromTheCut) {
   stabilizer_global global = empty_clip(1, 100);
-  add_track(global, 0, 10, 90, at_slot(0), shifted);
+  add_moving(global, 0, 10, 90);
   for (const int f : {10, 11, 40}) global.output_at(f, 0).status = -1;
   const displacement_lists lists = blended_displacements(global, {}, {});
-  for (int f = 0; f < 100; ++f) ASSERT_EQ(lists[f].size(), f >= 12 && f < 40 ? 1u : 0u) << f;
-  EXPECT_NEAR(lists[12][0].weight, 0.01, 1e-15);  // fades from the cut
-  EXPECT_EQ(lists[39][0].nextIndex, -1);
+  expect_lists(
+      lists, 1, [](int f, int) { return f >= 12 && f < 40; }, [](int) { return 10; });
+  EXPECT_NEAR(lists[12][0].weight, 0.01, 1e-15);
+  EXPECT_NEAR(lists[25][0].weight, 0.14, 1e-15);
 }
 
 // Window [40, 100) whose first 30 frames had been solved before, 8 pixels to the right.
@@ -82,30 +87,34 @@ TEST(BlendedDisplacementsTest, AWindowsStartMovesFromTheOldSolutionToTheNew) {
         return point2{0, 0};
       },
       shifted);
-  const displacement_lists lists = blended_displacements(global, {overlapping(global)}, {});
+  const factorization_window window = overlapping(global);
+  global.output_at(60, 0).status = -1;  // held by the old solution alone
+  const displacement_lists lists = blended_displacements(global, {window}, {});
   const double expected[][2] = {{0, .967742}, {1, .935484}, {15, .483871}, {29, .032258}};
   for (const auto& [f, t] : expected) {
     EXPECT_NEAR(lists[40 + static_cast<int>(f)][0].targetX, 10 + 8 * t, 1e-5);
+    EXPECT_EQ(lists[40 + static_cast<int>(f)][0].weight, .5);  // as its span is as long as a flank
   }
   EXPECT_EQ(lists[39][0].targetX, 10);
   EXPECT_EQ(lists[70][0].targetX, 10);
+  EXPECT_EQ(lists[60][0].targetX, 18);
+  EXPECT_NEAR(lists[60][0].weight, .5 * 10 / 31, 1e-12);
 }
 
 TEST(BlendedDisplacementsTest, InsideAnOverlapTheWindowsTableSaysWhoLives) {
   stabilizer_global global = empty_clip(2, 100);
-  add_track(global, 0, 0, 100, at_slot(0), shifted);
-  add_track(global, 1, 50, 100, at_slot(100), shifted);
+  add_moving(global, 0, 0, 100);
+  add_moving(global, 1, 50, 100);
   factorization_window window = overlapping(global);
   window.overlap_rows[20 * 2 + 0].status = -1;  // frame 60 of the first track
   window.overlap_rows[10 * 2 + 1].status = -1;  // the second one's first frame
   const displacement_lists lists = blended_displacements(global, {window}, {});
-  EXPECT_EQ(lists[59].size(), 1u);
-  for (int f = 60; f < 100; ++f) ASSERT_TRUE(lists[f].empty()) << f;
+  for (int f = 0; f < 100; ++f) ASSERT_EQ(lists[f].size(), f < 60) << f;
 }
 
 TEST(MemberDisplacementsTest, TracksRunAsLongAsTheirWindowsListThem) {
   stabilizer_global global = empty_clip(3, 120);
-  for (int s = 0; s < 3; ++s) add_track(global, s, 0, 120, at_slot(100 * s), shifted);
+  for (int s = 0; s < 3; ++s) add_moving(global, s, 0, 120);
   for (track_sample& sample : global.output) sample.status = -1;  // nothing solved yet
   std::vector<factorization_window> windows(2);
   windows[0].first = 10;
@@ -115,50 +124,26 @@ TEST(MemberDisplacementsTest, TracksRunAsLongAsTheirWindowsListThem) {
   windows[1].end = 100;
   windows[1].trajectories_begin = 1;
   windows[1].trajectory_flags = {1, 1};
-  const displacement_lists lists = member_displacements(global, windows, {});
-  const auto alive = [&](int f, int slot) {
-    for (const Displacement& d : lists[f]) {
-      if (d.track->feature == slot) return true;
-    }
-    return false;
-  };
-  for (int f = 0; f < 120; ++f) {
-    ASSERT_EQ(alive(f, 0), f >= 10 && f < 50) << f;
-    ASSERT_EQ(alive(f, 1), f >= 10 && f < 100) << f;
-    ASSERT_EQ(alive(f, 2), f >= 50 && f < 100) << f;
-  }
+  expect_lists(
+      member_displacements(global, windows, {}), 3,
+      [](int f, int s) { return f >= (s == 2 ? 50 : 10) && f < (s == 0 ? 50 : 100); },
+      [](int) { return 10; });
 }
 
 TEST(RefreshTargetsTest, DroppedRecordsLeaveAllLinksRight) {
   stabilizer_global global = empty_clip(4, 30);
-  for (int s = 0; s < 4; ++s) add_track(global, s, 0, 30, at_slot(100 * s), shifted);
+  for (int s = 0; s < 4; ++s) add_moving(global, s, 0, 30);
   displacement_lists lists = blended_displacements(global, {}, {});
   for (track_sample& sample : global.output) sample.x += 1;
-  global.output_at(9, 3).status = -1;   // beside the range
-  global.output_at(10, 0).status = -1;  // the range's first frame
-  global.output_at(15, 1).status = -1;
-  global.output_at(15, 2).status = -1;
-  global.output_at(19, 0).status = -1;  // and its last
-  refresh_targets(lists, global, 10, 20);
-  EXPECT_EQ(lists[9].size(), 4u);
-  EXPECT_EQ(lists[10].size(), 3u);
-  EXPECT_EQ(lists[15].size(), 2u);
-  for (int f = 0; f < 30; ++f) {
-    for (const Displacement& d : lists[f]) {
-      ASSERT_EQ(d.targetX, d.sourceX + (f >= 10 && f < 20 ? 11 : 10)) << f;
-      const auto dead = [&](int g) {
-        return g >= 10 && g < 20 && global.output_at(g, d.track->feature).status < 0;
-      };
-      ASSERT_EQ(d.nextIndex < 0, f == 29 || dead(f + 1)) << f << " " << d.track->feature;
-      ASSERT_EQ(d.prevIndex < 0, f == 0 || dead(f - 1)) << f << " " << d.track->feature;
-      if (d.nextIndex >= 0) {
-        ASSERT_EQ(lists[f + 1][d.nextIndex].track, d.track);
-      }
-      if (d.prevIndex >= 0) {
-        ASSERT_EQ(lists[f - 1][d.prevIndex].track, d.track);
-      }
-    }
+  // Beside the range, on its first frame, inside it, and on its last.
+  for (const auto& [f, s] : {std::pair(9, 3), {10, 0}, {15, 1}, {15, 2}, {19, 0}}) {
+    global.output_at(f, s).status = -1;
   }
+  refresh_targets(lists, global, 10, 20);
+  const auto inside = [](int f) { return f >= 10 && f < 20; };
+  expect_lists(
+      lists, 4, [&](int f, int s) { return !inside(f) || global.output_at(f, s).status >= 0; },
+      [&](int f) { return inside(f) ? 11 : 10; });
 }
 
 }  // namespace

@@ -1,55 +1,66 @@
 #include <gtest/gtest.h>
 
-#include <boost/make_shared.hpp>
-#include <cmath>
+#include <algorithm>
+#include <limits>
 #include <string>
 #include <vector>
 
-#include "stabilization/warp/cp_warper.h"
 #include "tests/stabilization/solve_clips.h"
+#include "tests/stabilization/warper_clips.h"
 
 // Clips with little or nothing to go by.
 namespace marrow::stabilization {
 namespace {
 
-stabilizer_global shaken(int frames, int slots, int first, int end, int slot_begin = 0) {
-  stabilizer_global global = empty_table(frames, slots);
+// Points of a shaken camera in slots [slot_begin, slots).
+stabilizer_global shaken_clip(int frames, int slots, int end, int slot_begin = 0) {
+  stabilizer_global global = empty_clip(slots, frames);
   for (int s = slot_begin; s < slots; ++s) {
-    put_track(global, s, first, end, [&](int f) {
-      return point2{scattered(s).x + 8 * std::sin(1.7 * f), scattered(s).y + 6 * std::cos(2.9 * f)};
-    });
+    put_track(global, s, 0, end, [s](int f) { return shaken(scattered(s), f); });
   }
   return global;
 }
 
-TEST(StabilizerMainDegenerate, StillPictureComesOutExact) {
-  synthetic::track_world_options options;
-  options.frame_count = 100;
-  options.slots = 200;
-  options.scene = synthetic::track_scene::still;
-  options.noise = 0;
-  options.whole_clip = true;
-  const solved_clip clip = solve(make_track_world(options), params_1080p());
-  ASSERT_EQ(clip.result, 1);
-  ASSERT_EQ(clip.window_spans(), "0 100;");
-  for (std::size_t i = 0; i < clip.global.input.size(); ++i) {
-    ASSERT_EQ(clip.global.output[i].x, clip.global.input[i].x);
-    ASSERT_EQ(clip.global.output[i].y, clip.global.input[i].y);
+// All tracks in one place: a single signal, and every other coefficient a multiple of its own.
+stabilizer_global tracks_at(point2 p) {
+  stabilizer_global global = empty_clip(50, 100);
+  for (int s = 0; s < 50; ++s) {
+    put_track(global, s, 0, 100, [p](int) { return p; });
   }
+  return global;
+}
 
-  CPWarper warper(100, 1920, 1080);
-  warper.buildDisplacements(boost::make_shared<stabilizer_global>(clip.global), clip.windows,
-                            clip.transitions, params_1080p(), [] {});
-  warper.drive([] {});
-  for (std::size_t f = 0; f < 100; ++f) {
-    const VarVector& grid = *warper.frameWarp(f);
-    for (int r = 0; r < grid.rows; ++r) {
-      for (int c = 0; c < grid.cols; ++c) {
-        ASSERT_NEAR(grid.vertex(c, r).x, c * warper.cellWidth(), 1e-8);
-        ASSERT_NEAR(grid.vertex(c, r).y, r * warper.cellHeight(), 1e-8);
-      }
+stabilizer_global scene_cut() {
+  stabilizer_global global = empty_clip(200, 300);
+  for (std::size_t s = 0; s < 200; ++s) {
+    for (const int first : {0, 150}) {
+      put_track(global, s, first, first + 150,
+                [&](int f) { return shaken(scattered(s + first), f); });
     }
   }
+  return global;
+}
+
+// No sample ever starts a track.
+stabilizer_global never_started(int frames) {
+  stabilizer_global global = empty_clip(100, frames);
+  for (track_sample& s : global.input) s = {0, 0, 0, 0};
+  return global;
+}
+
+stabilizer_global scene(synthetic::track_scene kind) {
+  synthetic::track_world_options options = world_of(120, 150);
+  options.scene = kind;
+  options.noise = kind == synthetic::track_scene::still ? 1e-3 : 0;
+  return clip_of(options);
+}
+
+// Frames without any track between two windows: each is bridged to its side of them.
+stabilizer_global hole_in_the_middle() {
+  synthetic::track_world_options options = world_of(300, 300, 200);
+  options.scene = synthetic::track_scene::similarity;  // what a transition can follow
+  options.hole = {140, 160};
+  return clip_of(options);
 }
 
 // The ranks at which the solve was tried again, in order.
@@ -62,153 +73,94 @@ std::string lower_ranks(const std::string& log) {
   return ranks;
 }
 
-TEST(StabilizerMainDegenerate, RankFallsToWhatTheTracksHold) {
-  // All tracks on one still point: one signal, and every other coefficient a multiple of its own.
-  stabilizer_global point = empty_table(100, 50);
-  for (int s = 0; s < 50; ++s) {
-    put_track(point, s, 0, 100, [](int) { return point2{512, 512}; });
-  }
-  const solved_clip clip = solve(std::move(point), params_1080p());
-  ASSERT_EQ(clip.result, 1);
-  EXPECT_EQ(lower_ranks(clip.log), "421");
-  ASSERT_EQ(clip.window_spans(), "0 100;");
-  EXPECT_EQ(clip.windows.front().rank, 1u);
-  for (const track_sample& s : clip.global.output) {
-    ASSERT_NEAR(s.x, 512, 1e-4);
-    ASSERT_NEAR(s.y, 512, 1e-4);
-  }
-}
+struct degenerate_clip {
+  const char* situation;
+  stabilizer_global global;
+  int result;
+  const char *ranks, *windows, *transitions;
+  double bend;  // pixels: what a typical track may still bend on any frame
+};
 
-TEST(StabilizerMainDegenerate, TracksAtTheOriginHoldNothing) {
-  stabilizer_global origin = empty_table(100, 50);
-  for (int s = 0; s < 50; ++s) put_track(origin, s, 0, 100, [](int) { return point2{0, 0}; });
-  const solved_clip clip = solve(std::move(origin), params_1080p());
-  EXPECT_EQ(clip.result, 0);
-  EXPECT_EQ(lower_ranks(clip.log), "4210");
-  EXPECT_TRUE(clip.windows.empty());
-  EXPECT_TRUE(clip.transitions.empty());
-}
-
-TEST(StabilizerMainDegenerate, FullRankIsKeptByAnyRealMotion) {
-  for (const synthetic::track_scene scene :
-       {synthetic::track_scene::planar, synthetic::track_scene::translation,
-        synthetic::track_scene::similarity, synthetic::track_scene::still}) {
-    synthetic::track_world_options options;
-    options.frame_count = 120;
-    options.slots = 150;
-    options.scene = scene;
-    options.noise = scene == synthetic::track_scene::still ? 1e-3 : 0;
-    const solved_clip clip = solve(make_track_world(options), params_1080p());
-    ASSERT_EQ(clip.result, 1);
-    ASSERT_EQ(clip.windows.size(), 1u);
-    EXPECT_EQ(clip.windows.front().rank, 9u) << "scene " << static_cast<int>(scene);
-  }
-}
-
-TEST(StabilizerMainDegenerate, FewerFramesThanTheRank) {
-  for (const int frames : {1, 2, 5, 8}) {
-    const solved_clip clip = solve(shaken(frames, 60, 0, frames), params_1080p());
-    ASSERT_EQ(clip.result, 1) << frames;
-    EXPECT_NE(clip.log.find("Moving factorizatoin disabled because of too few frames (" +
-                            std::to_string(frames) + ")."),
-              std::string::npos);
-    EXPECT_TRUE(clip.windows.empty());
-    // Tracks of fewer than five frames do not count.
-    EXPECT_EQ(clip.transition_spans(),
-              (frames < 5 ? "unsolved 0 " : "solved 0 ") + std::to_string(frames) + ";");
-  }
-}
-
-TEST(StabilizerMainDegenerate, FewerTracksThanHalfTheRank) {
-  // Four slots are too few by the table, eight slots with four tracks by the scan.
-  for (const int slots : {1, 2, 4, 8}) {
-    const solved_clip clip = solve(shaken(120, slots, 0, 120, slots == 8 ? 4 : 0), params_1080p());
-    ASSERT_EQ(clip.result, 1) << slots;
-    EXPECT_EQ(clip.log.find("disabled"), std::string::npos);
-    EXPECT_TRUE(clip.windows.empty());
-    EXPECT_EQ(clip.transition_spans(), slots == 1 ? "unsolved 0 120;" : "solved 0 120;");
-    if (slots < 4) continue;
-    const Trajectory& t = clip.global.trajectories.front();
-    EXPECT_LT(roughness(clip, clip.global.output, t), 0.2 * roughness(clip, clip.global.input, t));
-  }
-}
-
-TEST(StabilizerMainDegenerate, NothingTracked) {
-  for (const int frames : {1, 50}) {
-    stabilizer_global zeros = empty_table(frames, 100);
-    for (track_sample& s : zeros.input) s = {0, 0, 0, 0};  // no sample ever starts a track
-    for (stabilizer_global global : {std::move(zeros), empty_table(frames, 100)}) {
-      const solved_clip clip = solve(std::move(global), params_1080p());
-      ASSERT_EQ(clip.result, 1);
-      EXPECT_TRUE(clip.windows.empty());
-      EXPECT_EQ(clip.transition_spans(), "unsolved 0 " + std::to_string(frames) + ";");
-      for (const double v : clip.transitions.front().motion) EXPECT_TRUE(v == 0 || v == 1);
-      for (const track_sample& s : clip.global.output) ASSERT_EQ(s.status, -1);
+TEST(StabilizerMainDegenerate, EveryClipComesOutCovered) {
+  using enum synthetic::track_scene;
+  constexpr double kAny = std::numeric_limits<double>::infinity();
+  const degenerate_clip clips[] = {
+      {"rank 1", tracks_at({512, 512}), 1, "421", "0 100;", "", 1e-3},
+      {"nothing to hold", tracks_at({0, 0}), 0, "4210", "", "", kAny},
+      {"a plane", scene(planar), 1, "", "0 120;", "", 0.3},
+      {"shifts alone", scene(translation), 1, "", "0 120;", "", 0.3},
+      {"similarities alone", scene(similarity), 1, "", "0 120;", "", 0.3},
+      {"noise alone", scene(still), 1, "", "0 120;", "", 0.3},
+      // Fewer frames than the rank; tracks under five frames do not count.
+      {"one frame", shaken_clip(1, 60, 1), 1, "", "", "unsolved 0 1;", kAny},
+      {"four frames", shaken_clip(4, 60, 4), 1, "", "", "unsolved 0 4;", kAny},
+      {"five frames", shaken_clip(5, 60, 5), 1, "", "", "solved 0 5;", 3},
+      {"eight frames", shaken_clip(8, 60, 8), 1, "", "", "solved 0 8;", 3},
+      // Tracks too few for the rank, by the table or by the scan.
+      {"one track", shaken_clip(120, 1, 120), 1, "", "", "unsolved 0 120;", kAny},
+      {"four tracks", shaken_clip(120, 4, 120), 1, "", "", "solved 0 120;", 3},
+      {"four of eight slots", shaken_clip(120, 8, 120, 4), 1, "", "", "solved 0 120;", 3},
+      {"too few complete", clip_of(world_of(200, 20)), 1, "", "", "solved 0 200;", kAny},
+      {"few but long", clip_of(world_of(200, 20, 200)), 1, "", "0 200;", "", 0.3},
+      {"no tracks", empty_clip(100, 50), 1, "", "", "unsolved 0 50;", kAny},
+      {"no tracks on one frame", empty_clip(100, 1), 1, "", "", "unsolved 0 1;", kAny},
+      {"no starts", never_started(50), 1, "", "", "unsolved 0 50;", kAny},
+      // 100 tracks fade by 0.01 a frame each, so they hold 7.5 up to frame 112; a window of 113
+      // frames at most ends at 110, as it grows from 40 by fives.
+      {"all die at once", shaken_clip(200, 100, 120), 1, "", "0 110;",
+       "solved 110 120;unsolved 120 200;", 0.3},
+      // 200 tracks hold 7.5 up to frame 146 and from 153 on.
+      {"scene cut", scene_cut(), 1, "", "0 145;153 300;", "solved 145 163;", 0.3},
+      // 300 tracks hold it up to frame 137 and from 162 on. In a transition they keep their noise
+      // of 0.1 pixels, which bends them by 0.3.
+      {"hole", hole_in_the_middle(), 1, "", "0 135;162 300;",
+       "solved 135 140;unsolved 140 160;solved 160 172;", 0.5}};
+  for (const degenerate_clip& e : clips) {
+    SCOPED_TRACE(e.situation);
+    const solved_clip clip = solve(e.global, params_1080p());
+    EXPECT_EQ(clip.result, e.result);
+    EXPECT_EQ(lower_ranks(clip.log), e.ranks);
+    EXPECT_EQ(spans_of(clip.windows), e.windows);
+    EXPECT_EQ(spans_of(clip.transitions), e.transitions);
+    EXPECT_EQ(clip.log.find("disabled because of too few frames") != std::string::npos,
+              e.global.frame_count < 9);
+    std::vector<int> covered(clip.global.frame_count);
+    for (const factorization_window& w : clip.windows) {
+      std::fill(covered.begin() + w.first, covered.begin() + w.end, 1);
+    }
+    for (const transition_record& r : clip.transitions) {
+      std::fill(covered.begin() + r.first, covered.begin() + r.end, 1);
+      if (r.kind == transition_record::solved) continue;
+      for (std::size_t k = 0; k < r.motion.size(); ++k) ASSERT_EQ(r.motion[k], k % 4 == 0);
+      for (std::size_t i = 0; i < clip.global.feature_count; ++i) {
+        for (std::size_t f = r.first; f < r.end; ++f) {
+          ASSERT_EQ(clip.global.output_at(f, i).status, -1);
+        }
+      }
+    }
+    EXPECT_TRUE(std::count(covered.begin(), covered.end(), 0) == 0 || e.result == 0);
+    if (e.bend == kAny) continue;
+    const std::vector<track_sample> blended = blended_output(clip);
+    for (std::size_t f = 1; f + 1 < clip.global.frame_count; ++f) {
+      EXPECT_FALSE(median_bend(clip, blended, f) > e.bend) << "frame " << f;
     }
   }
 }
 
-// 100 tracks fade by 0.01 a frame each, so they hold 7.5 up to frame 112; a window of 113 frames at
-// most ends at 110, as it grows from 40 by fives.
-TEST(StabilizerMainDegenerate, EverythingDiesAtOnce) {
-  const solved_clip clip = solve(shaken(200, 100, 0, 120), params_1080p());
-  ASSERT_EQ(clip.result, 1);
-  EXPECT_EQ(clip.window_spans(), "0 110;");
-  EXPECT_EQ(clip.transition_spans(), "solved 110 120;unsolved 120 200;");
-  for (const Trajectory& t : clip.global.trajectories) {
-    EXPECT_LT(roughness(clip, clip.global.output, t), 0.1);
-    EXPECT_GT(roughness(clip, clip.global.input, t), 10);
+TEST(StabilizerMainDegenerate, StillPictureComesOutExact) {
+  synthetic::track_world_options options = world_of(100, 200);
+  options.scene = synthetic::track_scene::still;
+  options.noise = 0;
+  options.whole_clip = true;
+  const solved_clip clip = solve(clip_of(options), params_1080p());
+  ASSERT_EQ(spans_of(clip.windows), "0 100;");
+  for (std::size_t i = 0; i < clip.global.input.size(); ++i) {
+    ASSERT_EQ(clip.global.output[i].x, clip.global.input[i].x);
+    ASSERT_EQ(clip.global.output[i].y, clip.global.input[i].y);
   }
-}
-
-// All tracks end at a cut and others begin: as 200 hold 7.5 up to frame 146 and from 153 on, the
-// windows are [0, 145) and [153, 300) with a transition over the cut.
-TEST(StabilizerMainDegenerate, SceneCut) {
-  stabilizer_global global = empty_table(300, 200);
-  for (int s = 0; s < 200; ++s) {
-    for (const int first : {0, 150}) {
-      put_track(global, s, first, first + 150, [&](int f) {
-        const point2 p = scattered(s + first);
-        return point2{p.x + 8 * std::sin(1.7 * f), p.y + 6 * std::cos(2.9 * f)};
-      });
-    }
-  }
-  const solved_clip clip = solve(std::move(global), params_1080p());
-  ASSERT_EQ(clip.result, 1);
-  EXPECT_EQ(clip.window_spans(), "0 145;153 300;");
-  EXPECT_EQ(clip.transition_spans(), "solved 145 163;");
-  const std::vector<track_sample> blended = blended_output(clip, params_1080p());
-  for (std::size_t f = 1; f + 1 < 300; ++f) {
-    if (f == 149 || f == 150) continue;  // no track lives on both sides
-    EXPECT_LT(median_bend(clip, blended, f), 0.3) << "frame " << f;
-  }
-}
-
-// Frames without any track between two windows: each is bridged to its side of them.
-TEST(StabilizerMainDegenerate, HoleInTheMiddle) {
-  synthetic::track_world_options options;
-  options.slots = 300;
-  options.mean_life = 200;
-  options.scene = synthetic::track_scene::similarity;  // what a transition can follow
-  options.hole = {140, 160};
-  const solved_clip clip = solve(make_track_world(options), params_1080p());
-  ASSERT_EQ(clip.result, 1);
-  ASSERT_EQ(clip.windows.size(), 2u);
-  const std::uint64_t end = clip.windows[0].end, first = clip.windows[1].first;
-  EXPECT_GE(end, 120u);
-  EXPECT_LE(first, 180u);
-  EXPECT_EQ(clip.transition_spans(), "solved " + std::to_string(end) +
-                                         " 140;unsolved 140 160;solved 160 " +
-                                         std::to_string(first + 10) + ";");
-  // In a transition the tracks keep their noise of 0.1 pixels, which bends them by 0.3.
-  const std::vector<track_sample> blended = blended_output(clip, params_1080p());
-  for (std::size_t f = 1; f + 1 < 300; ++f) {
-    if (f >= 139 && f <= 160) continue;
-    EXPECT_LT(median_bend(clip, blended, f), 0.5) << "frame " << f;
-    EXPECT_GT(median_bend(clip, clip.global.input, f), 1.0);
-  }
-  EXPECT_LT(median_bend(clip, blended, 100), 0.15);
-  EXPECT_LT(median_bend(clip, blended, 220), 0.15);
+  const auto warper = built(boost::make_shared<stabilizer_global>(clip.global), 4, clip.windows);
+  warper->drive(kNoProgress);
+  for (int f = 0; f < 100; ++f) ASSERT_LT(distance_from(*warper, f, identity3), 1e-8);
 }
 
 }  // namespace

@@ -3,7 +3,7 @@
 #include <boost/make_shared.hpp>
 
 #include "stabilization/warp/cp_warper.h"
-#include "tests/stabilization/displacement_lists.h"
+#include "tests/stabilization/clips.h"
 
 // Whole clips for the warper: random tracks over 1920 x 1080 that live all the time.
 namespace marrow::stabilization {
@@ -18,8 +18,19 @@ boost::shared_ptr<stabilizer_global> clip_of(int tracks, int frames, Wanted want
   std::uniform_real_distribution<double> unit(0, 1);
   for (int s = 0; s < tracks; ++s) {
     const point2 p = {unit(random) * (kWidth - 1), unit(random) * (kHeight - 1)};
-    add_track(
-        *global, s, 0, frames, [&](int) { return p; }, wanted);
+    add_still(*global, s, 0, frames, p, wanted);
+  }
+  return global;
+}
+
+// Two rings of four corners about the frame's middle, 400 and 200 pixels to each side.
+template <class Wanted>
+boost::shared_ptr<stabilizer_global> rings_clip(int frames, Wanted wanted) {
+  auto global = boost::make_shared<stabilizer_global>(empty_clip(8, frames));
+  for (int s = 0; s < 8; ++s) {
+    const double ring = s < 4 ? 400 : 200;
+    const point2 p = {960 + (s & 1 ? ring : -ring), 540 + (s & 2 ? ring : -ring)};
+    add_still(*global, s, 0, frames, p, wanted);
   }
   return global;
 }
@@ -30,25 +41,31 @@ inline std::vector<factorization_window> whole_clip(int frames) {
   return {window};
 }
 
-inline boost::shared_ptr<CPWarper> built(boost::shared_ptr<stabilizer_global> global, float method,
-                                         const std::vector<transition_record>& transitions = {},
-                                         bool window = true) {
+// A warper with its models decided. homography_limit: what a frame's homography may be off.
+inline boost::shared_ptr<CPWarper> built(
+    const boost::shared_ptr<stabilizer_global>& global, float method,
+    const std::vector<factorization_window>& windows,
+    const std::vector<transition_record>& transitions = {},
+    float homography_limit = SolverParamsRecord().homography_limit) {
   const int frames = static_cast<int>(global->frame_count);
   auto warper = boost::make_shared<CPWarper>(frames, kWidth, kHeight);
   SolverParamsRecord parameters;
   parameters.method_level = method;
   parameters.track_fade_minimum = 0;
-  warper->buildDisplacements(global,
-                             window ? whole_clip(frames) : std::vector<factorization_window>{},
-                             transitions, parameters, [] {});
+  parameters.homography_limit = homography_limit;
+  warper->buildDisplacements(global, windows, transitions, parameters, kNoProgress);
   return warper;
 }
 
-inline boost::shared_ptr<CPWarper> driven(boost::shared_ptr<stabilizer_global> global, float method,
-                                          const std::vector<transition_record>& transitions = {},
-                                          bool window = true) {
-  auto warper = built(global, method, transitions, window);
-  warper->drive([] {});
+inline boost::shared_ptr<CPWarper> built(const boost::shared_ptr<stabilizer_global>& global,
+                                         float method) {
+  return built(global, method, whole_clip(static_cast<int>(global->frame_count)));
+}
+
+inline boost::shared_ptr<CPWarper> driven(const boost::shared_ptr<stabilizer_global>& global,
+                                          float method) {
+  auto warper = built(global, method);
+  warper->drive(kNoProgress);
   return warper;
 }
 

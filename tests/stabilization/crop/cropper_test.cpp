@@ -1,33 +1,26 @@
 #include "stabilization/crop/cropper.h"
 
-#include <gmock/gmock.h>
+#include <gtest/gtest.h>
 
 #include <boost/make_shared.hpp>
 #include <cmath>
 #include <functional>
-#include <limits>
+#include <string>
+#include <utility>
 
 #include "stabilization/crop/crop_path.h"
 #include "stabilization/crop/outline_mask.h"
+#include "tests/stabilization/clips.h"
 
 using namespace marrow::stabilization;
-using testing::FloatNear;
 
 namespace {
 
-using motion = std::function<point2(double, double)>;
+using motion = std::function<point2(point2)>;
 
 boost::shared_ptr<const VarVector> warped(int width, int height, int cols, int rows,
                                           const motion& to) {
-  const auto warp = boost::make_shared<VarVector>(cols, rows);
-  for (int r = 0; r < rows; ++r) {
-    for (int c = 0; c < cols; ++c) {
-      const point2 p = to(c * (width - 1.0) / (cols - 1), r * (height - 1.0) / (rows - 1));
-      warp->values[2 * (r * cols + c)] = p.x;
-      warp->values[2 * (r * cols + c) + 1] = p.y;
-    }
-  }
-  return warp;
+  return boost::make_shared<VarVector>(grid_over(width, height, cols, rows, to));
 }
 
 boost::shared_ptr<const VarVector> full_hd(const motion& to) {
@@ -35,7 +28,7 @@ boost::shared_ptr<const VarVector> full_hd(const motion& to) {
 }
 
 motion shift(double dx, double dy) {
-  return [=](double x, double y) { return point2{x + dx, y + dy}; };
+  return [=](point2 p) { return point2{p.x + dx, p.y + dy}; };
 }
 
 frame_bounds bounds_of(const std::vector<boost::shared_ptr<const VarVector>>& warps) {
@@ -51,58 +44,67 @@ frame_bounds bounds_of(const std::vector<boost::shared_ptr<const VarVector>>& wa
   return b;
 }
 
+std::vector<boost::shared_ptr<const VarVector>> three_shifts() {
+  return {full_hd(shift(0, 0)), full_hd(shift(6.25, 0)), full_hd(shift(0, -3.5))};
+}
+
 boost::shared_ptr<cropper> crop(const std::vector<boost::shared_ptr<const VarVector>>& warps,
-                                bool no_motion) {
-  SolverParamsRecord parameters;
-  parameters.no_motion = no_motion;
+                                const SolverParamsRecord& parameters) {
   std::size_t calls = 0;
   const auto result = RunCropper(parameters, warps, bounds_of(warps), false, [&calls] { ++calls; });
   EXPECT_EQ(calls, warps.size());
   return result;
 }
 
-void expect_rect(const crop_rect& rect, float left, float right, float top, float bottom,
-                 float tolerance = 0) {
-  EXPECT_THAT(rect.left, FloatNear(left, tolerance));
-  EXPECT_THAT(rect.right, FloatNear(right, tolerance));
-  EXPECT_THAT(rect.top, FloatNear(top, tolerance));
-  EXPECT_THAT(rect.bottom, FloatNear(bottom, tolerance));
-}
-
-std::vector<crop_rect> four_rects() {
-  return {{0, 99, 0, 59}, {4, 103, 0, 59}, {8, 107, 2, 61}, {2, 101, 2, 61}};
-}
-
-TEST(Cropper, StillClip) {
-  for (const bool no_motion : {false, true}) {
-    const auto c = crop({full_hd(shift(0, 0)), full_hd(shift(0, 0))}, no_motion);
-    EXPECT_EQ(c->maskWidth, 1919u);
-    EXPECT_EQ(c->maskHeight, 1079u);
-    EXPECT_EQ(c->cropWidth, 1918);
-    EXPECT_EQ(c->cropHeight, 1078);
-    for (const crop_rect& rect : c->rects) expect_rect(rect, 1, 1918, 1, 1078);
-  }
+template <class Rect>
+void expect_sides(const Rect& rect, const Rect& expected) {
+  EXPECT_EQ(rect.left, expected.left);
+  EXPECT_EQ(rect.right, expected.right);
+  EXPECT_EQ(rect.top, expected.top);
+  EXPECT_EQ(rect.bottom, expected.bottom);
 }
 
 TEST(Cropper, ShiftedFrames) {
-  const std::vector<boost::shared_ptr<const VarVector>> warps = {
-      full_hd(shift(0, 0)), full_hd(shift(6.25, 0)), full_hd(shift(0, -3.5))};
+  const auto still = crop({full_hd(shift(0, 0)), full_hd(shift(0, 0))}, {});
+  EXPECT_EQ(still->maskWidth, 1919u);
+  EXPECT_EQ(still->maskHeight, 1079u);
+  EXPECT_EQ(still->cropWidth, 1918);
+  EXPECT_EQ(still->cropHeight, 1078);
+  for (const crop_rect& rect : still->rects) expect_sides(rect, {1, 1918, 1, 1078});
+
   cropper c(3, 1926, 1083);
-  for (std::size_t f = 0; f < 3; ++f) c.computeFrameRect(f, *warps[f], {0, -3.5}, true);
-  expect_rect(c.rects[0], 1, 1918, 4, 1082);
-  expect_rect(c.rects[1], 7, 1924, 4, 1082);
-  expect_rect(c.rects[2], 1, 1918, 1, 1078);
-  const auto constant = crop(warps, true);
-  EXPECT_EQ(constant->cropWidth, 1912);
-  EXPECT_EQ(constant->cropHeight, 1075);
-  for (const crop_rect& rect : constant->rects) expect_rect(rect, 7, 1918, 4, 1078);
+  for (std::size_t f = 0; f < 3; ++f) c.computeFrameRect(f, *three_shifts()[f], {0, -3.5}, true);
+  expect_sides(c.rects[0], {1, 1918, 4, 1082});
+  expect_sides(c.rects[1], {7, 1924, 4, 1082});
+  expect_sides(c.rects[2], {1, 1918, 1, 1078});
+}
+
+// Either the result or the one sigma that stands for it asks for a window that never moves.
+TEST(Cropper, WhatMakesTheWindowConstant) {
+  const struct {
+    bool no_motion;
+    float sigma;
+    bool constant;
+  } cases[] = {{true, 30, true}, {false, 1000000, true}, {false, 999999, false}};
+  for (const auto& e : cases) {
+    SolverParamsRecord parameters;
+    parameters.no_motion = e.no_motion;
+    parameters.path_gaussian_sigma = e.sigma;
+    parameters.path_bilateral_sigma = 4;
+    const auto c = crop(three_shifts(), parameters);
+    EXPECT_EQ(c->rects[0].left == c->rects[1].left, e.constant) << e.sigma;
+    if (!e.constant) continue;
+    EXPECT_EQ(c->cropWidth, 1912);
+    EXPECT_EQ(c->cropHeight, 1075);
+    for (const crop_rect& rect : c->rects) expect_sides(rect, {7, 1918, 4, 1078});
+  }
 }
 
 TEST(Cropper, RotatedFrame) {
-  const auto warp = full_hd([](double x, double y) {
-    const double c = std::cos(.02), s = std::sin(.02);
-    return point2{959.5 + c * (x - 959.5) - s * (y - 539.5),
-                  539.5 + s * (x - 959.5) + c * (y - 539.5)};
+  const auto warp = full_hd([](point2 p) {
+    const point2 middle = {959.5, 539.5};
+    const point2 turned = transform(similarity_matrix(1, .02, 0, 0), {p.x - 959.5, p.y - 539.5});
+    return point2{middle.x + turned.x, middle.y + turned.y};
   });
   const frame_bounds b = bounds_of({warp});
   cropper c(1, static_cast<std::uint64_t>(std::ceil(b.max_x - b.min_x)),
@@ -112,42 +114,43 @@ TEST(Cropper, RotatedFrame) {
   c.computeFrameRect(0, *warp, {b.min_x, b.min_y}, true);
   // From the seed (970, 558) the cross reaches 10, 1929, 19, 1097; the left side stops when the
   // bottom, in step with it, has left the bottom edge.
-  expect_rect(c.rects[0], 29, 1910, 38, 1078);
+  expect_sides(c.rects[0], {29, 1910, 38, 1078});
 }
 
 TEST(Cropper, FilledCellsGiveTheLargestRectangle) {
   // A diamond of half diagonal 20 about (20, 20): of the inscribed rectangles the square of half
   // side 10 is largest.
-  const auto diamond = warped(41, 41, 9, 9, [](double x, double y) {
-    return point2{20 + (x - 20) / 2 - (y - 20) / 2, 20 + (x - 20) / 2 + (y - 20) / 2};
+  const auto diamond = warped(41, 41, 9, 9, [](point2 p) {
+    return point2{20 + (p.x - p.y) / 2, (p.x + p.y) / 2};
   });
   cropper c(1, 40, 40);
   c.computeFrameRect(0, *diamond, {0, 0}, false);
-  expect_rect(c.rects[0], 10, 30, 10, 30);
+  expect_sides(c.rects[0], {10, 30, 10, 30});
 }
 
 TEST(Cropper, FoldedAndBrokenWarps) {
-  const auto message = [](const VarVector& warp) -> std::string {
+  const double nan = std::nan("");
+  const std::pair<motion, const char*> cases[] = {
+      {shift(0, 0), ""},
+      // The middle cell's centre drawn onto the top edge's line.
+      {[](point2 p) {
+         return point2{p.x, 50};
+       },
+       "Unknown cropping error 2"},
+      {shift(0, -90), "Unknown cropping error 1"},
+      {shift(nan, nan), "Unknown cropping error 1"},
+      // Beside the mask the test lets a seed through; nothing is read or hung on there.
+      {shift(500, 0), ""}};
+  for (const auto& [to, message] : cases) {
     cropper c(1, 100, 100);
+    std::string found;
     try {
-      c.computeFrameRect(0, warp, {0, 0}, true);
+      c.computeFrameRect(0, *warped(101, 101, 3, 3, to), {0, 0}, true);
     } catch (const std::runtime_error& error) {
-      return error.what();
+      found = error.what();
     }
-    return "";
-  };
-  VarVector warp = *warped(101, 101, 3, 3, shift(0, 0));
-  EXPECT_EQ(message(warp), "");
-  // The centre of the middle cell drawn onto the top edge's line.
-  VarVector on_line = *warped(101, 101, 3, 3, [](double x, double) { return point2{x, 50}; });
-  EXPECT_EQ(message(on_line), "Unknown cropping error 2");
-  VarVector above = *warped(101, 101, 3, 3, shift(0, -90));
-  EXPECT_EQ(message(above), "Unknown cropping error 1");
-  warp.values.assign(warp.values.size(), std::numeric_limits<double>::quiet_NaN());
-  EXPECT_EQ(message(warp), "Unknown cropping error 1");
-  // Beside the mask the test lets a seed through; nothing is read or hung on there.
-  VarVector beside = *warped(101, 101, 3, 3, shift(500, 0));
-  EXPECT_EQ(message(beside), "");
+    EXPECT_EQ(found, message);
+  }
 }
 
 TEST(Cropper, NothingInCommon) {
@@ -171,73 +174,84 @@ TEST(OutlineMask, LinesAreClippedAndHaveBothEnds) {
   EXPECT_THROW(outline_mask(std::int64_t{1} << 40, 1 << 20), std::length_error);
 }
 
+// The right and the bottom edge are drawn half a pixel further out, then cut to whole pixels.
+TEST(OutlineMask, TheFarEdgesLieHalfAPixelFurtherOut) {
+  for (const auto& [fraction, far] : {std::pair(0.3, 20), std::pair(0.6, 21)}) {
+    outline_mask mask(30, 30);
+    draw_outline(mask, *warped(21, 21, 3, 3, shift(fraction + 5, fraction + 5)), {5, 5});
+    for (int at = 0; at < 30; ++at) {
+      EXPECT_EQ(mask.at(at, 10), at == 0 || at == far) << fraction << " column " << at;
+      EXPECT_EQ(mask.at(10, at), at == 0 || at == far) << fraction << " row " << at;
+    }
+  }
+}
+
+TEST(OutlineMask, TheCrossIsThreePixelsWide) {
+  outline_mask mask(21, 21);
+  for (const auto& [x, y] : {std::pair(4, 9), {15, 11}, {9, 3}, {11, 17}}) mask.set(x, y);
+  for (const auto& [x, y] : {std::pair(7, 8), {13, 12}, {8, 6}, {12, 14}}) mask.set(x, y);
+  expect_sides(grow_cross(mask, 10, 10), {5, 14, 4, 16});
+}
+
+// All sides move a pixel a turn over a mask that is set throughout. The near ones stop at the seed;
+// the far vertical one reaches it after 27 turns, which leaves no height and ends it.
 TEST(OutlineMask, ShrinkStopsAtTheSeed) {
-  outline_mask mask(20, 20);
-  for (int x = 0; x < 20; ++x) {
-    for (int y = 0; y < 20; ++y) {
-      if (x != 10 && y != 10) mask.set(x, y);
+  outline_mask mask(40, 40);
+  for (int i = 0; i < 1600; ++i) mask.set(i % 40, i / 40);
+  mask_rect low{0, 39, 0, 39}, high = low;
+  shrink_to_clear(mask, 10, 12, low);
+  shrink_to_clear(mask, 29, 27, high);
+  expect_sides(low, {10, 12, 12, 12});
+  expect_sides(high, {27, 29, 27, 27});
+}
+
+struct path_case {
+  const char* situation;
+  std::vector<crop_rect> rects;
+  bool bilateral;
+  float sigma, bilateral_sigma;
+  bool constant;
+  crop_size size;
+  point2 first, last;  // the windows' top left corners
+};
+
+TEST(CropPath, WindowsOfOneSizeFollowTheSmoothedCentres) {
+  using rects = std::vector<crop_rect>;
+  const rects four = {{0, 99, 0, 59}, {4, 103, 0, 59}, {8, 107, 2, 61}, {2, 101, 2, 61}};
+  const rects one = {{3, 102, 5, 64}}, tall = {{0, 99, 0, 299}}, wide = {{0, 299, 0, 99}};
+  const rects apart = {{0, 9, 0, 9}, {100, 109, 0, 9}},
+              wide_apart = {{0, 99, 0, 9}, {200, 299, 0, 9}};
+  const path_case cases[] = {
+      {"bilateral", four, true, 1, 1000, false, {96, 59}, {3.3481, .46694}, {5.79918, 2.41374}},
+      {"narrow", four, true, 2, 4, false, {98, 59}, {2.22239, 1.01177}, {3.85189, 2.32519}},
+      {"constant", four, false, 1, 0, true, {92, 58}, {8, 2}, {8, 2}},
+      {"nothing in common", apart, false, 1, 0, true, {0, 10}, {100, 0}, {100, 0}},
+      {"no frame", {}, true, 30, 500, false, {0, 0}, {}, {}},
+      {"one frame", one, true, 30, 500, false, {100, 60}, {3, 5}, {3, 5}},
+      {"no filter", apart, false, 0, 0, false, {10, 10}, {0, 0}, {100, 0}},
+      // The neighbour weighs exp(-1 / 0.33^2) = 1.028e-4, as 4 sigma reach it and 3 do not: each
+      // centre moves by 0.02056.
+      {"reach", wide_apart, false, .33f, 0, false, {100, 10}, {.04112, 0}, {200, 0}},
+      // The height's extents start from the width: 100 to both sides of the centre at 149.5.
+      {"tall", tall, false, 1, 0, false, {100, 201}, {0, 49.5}, {0, 49.5}},
+      {"wide", wide, false, 1, 0, false, {300, 100}, {0, 0}, {0, 0}},
+      // Centres 54.4722 and 54.5278: 45.4722 short on both sides, -90.94 + 1.5 cut to -89.
+      {"path beside the frames", apart, false, 30, 0, false, {-89, 10}, {99.9444, 0}, {100, 0}}};
+  for (const path_case& e : cases) {
+    SCOPED_TRACE(e.situation);
+    rects path = e.rects;
+    const crop_size size =
+        smooth_crop_path(path, e.bilateral, e.sigma, e.bilateral_sigma, e.constant);
+    EXPECT_EQ(size.width, e.size.width);
+    EXPECT_EQ(size.height, e.size.height);
+    if (path.empty()) continue;
+    expect_point_near({path.front().left, path.front().top}, e.first, 2e-4);
+    expect_point_near({path.back().left, path.back().top}, e.last, 2e-4);
+    for (const crop_rect& rect : path) {
+      EXPECT_FLOAT_EQ(rect.right, rect.left + static_cast<float>(e.size.width) - 1);
+      EXPECT_FLOAT_EQ(rect.bottom, rect.top + static_cast<float>(e.size.height) - 1);
     }
   }
-  mask_rect rect{0, 19, 0, 19};
-  shrink_to_clear(mask, 10, 10, rect);
-  EXPECT_EQ(rect.left, 10);
-  EXPECT_GE(rect.right, 10);
-  EXPECT_LE(rect.top, 10);
-  EXPECT_GE(rect.bottom, 10);
-}
-
-TEST(CropPath, SmoothedCentres) {
-  struct expectation {
-    float sigma, bilateral_sigma;
-    int width, height;
-    std::vector<float> x0, y0;
-  };
-  for (const expectation& e :
-       {expectation{1,
-                    1000,
-                    96,
-                    59,
-                    {3.3481f, 6.1599f, 8.0f, 5.79918f},
-                    {.46694f, .88068f, 2.0f, 2.41374f}},
-        expectation{2, 4, 98, 59, {2.22239f, 4.92241f, 8.0f, 3.85189f}, {}}}) {
-    std::vector<crop_rect> rects = four_rects();
-    const crop_size size = smooth_crop_path(rects, true, e.sigma, e.bilateral_sigma, false);
-    EXPECT_EQ(size.width, e.width);
-    EXPECT_EQ(size.height, e.height);
-    for (std::size_t f = 0; f < 4; ++f) {
-      EXPECT_NEAR(rects[f].left, e.x0[f], 2e-5 * 8);
-      EXPECT_FLOAT_EQ(rects[f].right, rects[f].left + size.width - 1);
-      if (!e.y0.empty()) {
-        EXPECT_NEAR(rects[f].top, e.y0[f], 2e-5);
-      }
-    }
-  }
-}
-
-TEST(CropPath, ConstantWindow) {
-  std::vector<crop_rect> rects = four_rects();
-  const crop_size size = smooth_crop_path(rects, false, 1, 0, true);
-  EXPECT_EQ(size.width, 92);
-  EXPECT_EQ(size.height, 58);
-  for (const crop_rect& rect : rects) expect_rect(rect, 8, 99, 2, 59);
-
-  std::vector<crop_rect> disjoint = {{0, 9, 0, 9}, {20, 29, 0, 9}};
-  EXPECT_EQ(smooth_crop_path(disjoint, false, 1, 0, true).width, 0);
-  for (const crop_rect& rect : disjoint) expect_rect(rect, 20, 19, 0, 9);
-}
-
-TEST(CropPath, ShortLists) {
-  std::vector<crop_rect> none;
-  EXPECT_EQ(smooth_crop_path(none, true, 30, 500, false).width, 0);
-  std::vector<crop_rect> one = {{3, 102, 5, 64}};
-  const crop_size size = smooth_crop_path(one, true, 30, 500, false);
-  EXPECT_EQ(size.width, 100);
-  EXPECT_EQ(size.height, 60);
-  expect_rect(one[0], 3, 102, 5, 64);
-  // A sigma of 0 leaves the path as it is.
-  std::vector<crop_rect> unfiltered = {{0, 99, 0, 59}, {4, 103, 0, 59}};
-  smooth_crop_path(unfiltered, false, 0, 0, false);
-  EXPECT_FLOAT_EQ(unfiltered[1].left - unfiltered[0].left, 4);
 }
 
 }  // namespace

@@ -1,22 +1,16 @@
 #include "stabilization/factorization/factorization_queue.h"
 
-#include <gmock/gmock.h>
+#include <gtest/gtest.h>
 
-#include <map>
-#include <string>
 #include <utility>
 #include <vector>
 
-#include "platform/tessel/debug.h"
+#include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 using range = std::pair<std::uint64_t, std::uint64_t>;
-
-const progress_functor kNoProgress = [] {};
 
 // A clip in which windows reach as far as their limit in steps of 5 from 40, and frames of the
 // given stretches are too weak.
@@ -29,10 +23,8 @@ class ScriptedMaker : public window_maker {
     requests.push_back({first, limit});
     factorization_window window;
     window.first = first;
-    window.end = std::min(frames_, first + std::min<std::uint64_t>(limit, 40));
-    while (window.end < frames_ && std::min(frames_, window.end + 5) - first <= limit) {
-      window.end = std::min(frames_, window.end + 5);
-    }
+    const std::uint64_t steps = limit < 40 ? limit : 40 + (limit - 40) / 5 * 5;
+    window.end = frames_ - first <= limit ? frames_ : first + steps;
     return window;
   }
 
@@ -60,91 +52,65 @@ class ScriptedMaker : public window_maker {
   std::vector<range> weak_;
 };
 
-class FactorizationQueueTest : public ::testing::Test {
- protected:
-  FactorizationQueueTest() {
-    tessel::debug::DebugDatabase::Set("ShowExperimentalEffectParameters", 1);
-    tessel::debug::SetSink([this](const std::string& text) { log_ += text; });
-  }
-  ~FactorizationQueueTest() override {
-    tessel::debug::SetSink({});
-    tessel::debug::DebugDatabase::Set("ShowExperimentalEffectParameters", 0);
-  }
-
-  std::vector<range> Run(std::uint64_t frames, std::vector<range> weak = {},
-                         std::vector<range> no_start = {}) {
-    stabilizer_global global;
-    global.frame_count = frames;
-    std::vector<std::size_t> complete(frames, 500);
-    for (const range& r : no_start) {
-      for (std::uint64_t f = r.first; f < r.second; ++f) complete[f] = 4;
-    }
-    ScriptedMaker maker(frames, std::move(weak));
-    std::vector<factorization_window> windows;
-    run_factorization_queue(global, parameters_, complete, maker, windows, kNoProgress);
-    requests_ = maker.requests;
-    std::vector<range> ranges;
-    for (const auto& w : windows) ranges.push_back({w.first, w.end});
-    return ranges;
-  }
-
-  SolverParamsRecord parameters_;
-  std::vector<range> requests_;
-  std::string log_;
+struct outcome {
+  std::vector<range> windows, requests;
 };
 
-TEST_F(FactorizationQueueTest, OrdinaryClips) {
-  EXPECT_THAT(Run(40), ElementsAre(range{0, 40}));
-  EXPECT_THAT(Run(330), ElementsAre(range{0, 330}));
-  EXPECT_THAT(Run(331), ElementsAre(range{0, 300}, range{270, 331}));
-  EXPECT_THAT(Run(900),
-              ElementsAre(range{0, 300}, range{270, 570}, range{540, 840}, range{810, 900}));
-  EXPECT_THAT(Run(1000),
-              ElementsAre(range{0, 300}, range{270, 570}, range{540, 840}, range{810, 1000}));
-  const auto windows = Run(10000);
-  EXPECT_EQ(windows.size(), 37u);
-  EXPECT_EQ(windows.back(), (range{9720, 10000}));
-  EXPECT_EQ(log_, "");
+// no_start: frames from which too few tracks are complete.
+outcome run(std::uint64_t frames, const std::vector<range>& weak, const range& no_start = {},
+            const SolverParamsRecord& parameters = {}) {
+  stabilizer_global global;
+  global.frame_count = frames;
+  std::vector<std::size_t> complete(frames, 5);
+  for (std::uint64_t f = no_start.first; f < no_start.second; ++f) complete[f] = 4;
+  ScriptedMaker maker(frames, weak);
+  std::vector<factorization_window> windows;
+  run_factorization_queue(global, parameters, complete, maker, windows, kNoProgress);
+  outcome found{{}, maker.requests};
+  for (const auto& w : windows) found.windows.push_back({w.first, w.end});
+  return found;
 }
 
-TEST_F(FactorizationQueueTest, AWeakStretchTruncatesItsWindow) {
+TEST(FactorizationQueueTest, WindowsCoverWhatTheirTracksHold) {
+  const struct {
+    const char* situation;
+    std::uint64_t frames;
+    std::vector<range> weak;
+    range no_start;
+    std::vector<range> windows;
+  } cases[] = {{"one window", 40, {}, {}, {{0, 40}}},
+               {"a short rest joins", 330, {}, {}, {{0, 330}}},
+               {"a longer one does not", 331, {}, {}, {{0, 300}, {270, 331}}},
+               {"whole steps", 900, {}, {}, {{0, 300}, {270, 570}, {540, 840}, {810, 900}}},
+               {"and a rest", 1000, {}, {}, {{0, 300}, {270, 570}, {540, 840}, {810, 1000}}},
+               {"a weak stretch truncates", 300, {{120, 140}}, {}, {{0, 120}, {140, 300}}},
+               {"in whole steps", 300, {{118, 140}}, {}, {{0, 115}, {140, 300}}},
+               {"near the start it abandons", 300, {{29, 50}}, {}, {{50, 300}}},
+               {"but not at the overlap itself", 300, {{30, 50}}, {}, {{0, 30}, {50, 300}}},
+               {"all weak", 100, {{0, 100}}, {}, {}},
+               {"begins where enough are complete", 300, {}, {0, 17}, {{17, 300}}},
+               {"which they never are", 300, {}, {0, 300}, {}}};
+  for (const auto& e : cases) {
+    captured_log log;
+    EXPECT_EQ(run(e.frames, e.weak, e.no_start).windows, e.windows) << e.situation;
+    EXPECT_EQ(log.text.empty(), e.weak.empty()) << e.situation;
+  }
+}
+
+TEST(FactorizationQueueTest, ATruncatedWindowIsMadeAgainOnlyIfChecked) {
+  captured_log log;
   // [0, 300) fails on 120; made again over 120 frames; goes on at 140.
-  EXPECT_THAT(Run(300, {{120, 140}}), ElementsAre(range{0, 120}, range{140, 300}));
-  EXPECT_THAT(requests_, ElementsAre(range{0, 301}, range{0, 120}, range{140, 161}));
-  EXPECT_EQ(log_,
+  EXPECT_EQ(run(300, {{120, 140}}).requests, (std::vector<range>{{0, 301}, {0, 120}, {140, 161}}));
+  EXPECT_EQ(log.text,
             "Factorization window [0, 300) does not pass the quality check..."
             "truncated to [0, 120)");
+  SolverParamsRecord unchecked;
+  unchecked.conservative_factorization = false;
+  EXPECT_EQ(run(400, {{120, 140}}, {}, unchecked).windows,
+            (std::vector<range>{{0, 300}, {270, 400}}));
 }
 
-TEST_F(FactorizationQueueTest, TruncationKeepsTheGrid) {
-  EXPECT_THAT(Run(300, {{118, 140}}), ElementsAre(range{0, 115}, range{140, 300}));
-}
-
-TEST_F(FactorizationQueueTest, ABadFrameNearTheStartAbandonsTheWindow) {
-  EXPECT_THAT(Run(300, {{29, 50}}), ElementsAre(range{50, 300}));
-  EXPECT_EQ(log_,
-            "Factorization window [0, 300) does not pass the quality check..."
-            "abandon the window.");
-  // At the overlap itself it is truncated; the override is below the moving window's duration.
-  EXPECT_THAT(Run(300, {{30, 50}}), ElementsAre(range{0, 30}, range{50, 300}));
-}
-
-TEST_F(FactorizationQueueTest, AllFramesWeak) {
-  EXPECT_THAT(Run(100, {{0, 100}}), IsEmpty());
-}
-
-TEST_F(FactorizationQueueTest, WindowsBeginWhereEnoughTracksAreComplete) {
-  EXPECT_THAT(Run(300, {}, {{0, 17}}), ElementsAre(range{17, 300}));
-  EXPECT_THAT(Run(300, {}, {{0, 300}}), IsEmpty());
-  EXPECT_THAT(requests_, IsEmpty());
-}
-
-TEST_F(FactorizationQueueTest, WithoutTheCheckEveryWindowStands) {
-  parameters_.conservative_factorization = false;
-  EXPECT_THAT(Run(400, {{120, 140}}), ElementsAre(range{0, 300}, range{270, 400}));
-}
-
-TEST_F(FactorizationQueueTest, CompleteTrajectoriesCountWhatTheDurationAsks) {
+TEST(FactorizationQueueTest, CompleteTrajectoriesCountWhatTheDurationAsks) {
   stabilizer_global global;
   global.frame_count = 100;
   global.trajectories = {

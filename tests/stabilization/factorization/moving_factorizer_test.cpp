@@ -2,247 +2,169 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
-#include <random>
-#include <stdexcept>
 #include <vector>
 
-#include "platform/lapack/lapack.h"
 #include "stabilization/factorization/window_filters.h"
+#include "synthetic/track_world.h"
+#include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
 
-struct life {
-  int first;
-  int last;
-};
+using lives = std::vector<std::pair<int, int>>;
 
-// Tracks that are exact mixtures of `rank` smooth signals, each in a slot of its own, as f32.
-class LowRankClip {
- public:
-  LowRankClip(int frames, int rank, const std::vector<life>& lives, unsigned seed = 1) {
-    std::mt19937 random(seed);
-    std::normal_distribution<double> normal;
-    global.frame_count = static_cast<std::uint64_t>(frames);
-    global.feature_count = lives.size();
-    global.input.assign(lives.size() * frames, {0, 0, -1, 0});
-    global.output = global.input;
-    for (std::size_t s = 0; s < lives.size(); ++s) {
-      std::vector<double> cx(rank), cy(rank);
-      for (int i = 0; i < rank; ++i) {
-        cx[i] = (i == 0 ? 300 : 40) * normal(random);
-        cy[i] = (i == 0 ? 300 : 40) * normal(random);
-      }
-      for (int f = lives[s].first; f < lives[s].last; ++f) {
-        double x = 0, y = 0;
-        for (int i = 0; i < rank; ++i) {
-          x += cx[i] * Signal(i, f);
-          y += cy[i] * Signal(i, f);
-        }
-        global.input[f * lives.size() + s] = {static_cast<float>(x), static_cast<float>(y),
-                                              f == lives[s].first ? f + 1 : 0, 1};
-      }
-    }
-    global.trajectories = tracking::BuildTrajectories(global.input.data(), lives.size(), frames);
-    for (const Trajectory& t : global.trajectories) order_.push_back(t.feature);
+constexpr double kCenterX = 960, kCenterY = 540;
+
+lives whole_clip(int count, int frames) {
+  return lives(count, {0, frames});
+}
+
+// Tracks of rank 4, each in a slot of its own.
+stabilizer_global clip_of(int frames, const lives& tracks) {
+  stabilizer_global global = empty_clip(tracks.size(), frames);
+  for (std::size_t s = 0; s < tracks.size(); ++s) {
+    put_track(global, s, tracks[s].first, tracks[s].second,
+              [s](int f) { return shaken(scattered(s), f); });
   }
+  build_trajectories(global);
+  return global;
+}
 
-  static double Signal(int i, int f) {
-    return i == 0 ? 1.0 : std::sin(0.05 * (i + 1) * f + i) + 0.01 * i * std::cos(0.9 * f + i);
+struct factorization {
+  moving_factorizer factorizer;
+  factorization_window window;
+
+  factorization(const stabilizer_global& global, int rank, int first, int limit, int duration = 40,
+                int step = 5) {
+    EXPECT_TRUE(factorizer.Setup(global.feature_count, global.frame_count, rank, duration, step));
+    const std::uint64_t end =
+        factorizer.Factorize(global, first, limit, kCenterX, kCenterY, window, kNoProgress);
+    EXPECT_EQ(end, window.end);
   }
+  int end() const { return static_cast<int>(window.end); }
 
-  // Index of the trajectory of slot s.
-  std::size_t TrajectoryOf(int s) const {
-    for (std::size_t t = 0; t < order_.size(); ++t) {
-      if (order_[t] == s) return t;
-    }
-    throw std::logic_error("no such slot");
-  }
-
-  double LargestError(const factorization_window& window) {
-    reprojection_errors(global, window, 0, 0);
+  // Of the samples that take part, pixels.
+  double largest_error(stabilizer_global& global) const {
+    for (track_sample& s : global.output) s.error = 0;
+    reprojection_errors(global, window, kCenterX, kCenterY);
     double largest = 0;
-    for (std::size_t t = 0; t < global.trajectories.size(); ++t) {
-      if (!window.takes_part(t)) continue;
-      const Trajectory& tr = global.trajectories[t];
-      for (int f = std::max<int>(tr.first, window.first); f < std::min<int>(tr.last, window.end);
-           ++f) {
-        largest = std::max<double>(largest, global.output_at(f, tr.feature).error);
-      }
-    }
+    for (const track_sample& s : global.output) largest = std::max<double>(largest, s.error);
     return largest;
   }
-
-  stabilizer_global global;
-
- private:
-  std::vector<int> order_;
 };
 
-std::vector<life> WholeClip(int count, int frames) {
-  return std::vector<life>(count, life{0, frames});
-}
-
-const progress_functor kNoProgress = [] {};
-
-factorization_window Factorize(const stabilizer_global& global, int rank, int first, int limit,
-                               int duration = 40, int step = 5) {
-  moving_factorizer factorizer;
-  EXPECT_TRUE(factorizer.Setup(global.feature_count, global.frame_count, rank, duration, step));
-  factorization_window window;
-  EXPECT_EQ(factorizer.Factorize(global, first, limit, 0, 0, window, kNoProgress), window.end);
-  return window;
-}
-
-TEST(MovingFactorizerTest, ASingleWindowIsTheTruncatedDecomposition) {
-  // Noise of full rank over a low-rank clip, so that truncation matters. Reference: the best rank
-  // 4 approximation leaves exactly the squares of the further singular values.
-  LowRankClip clip(20, 4, WholeClip(15, 20));
-  std::mt19937 random(7);
-  std::normal_distribution<float> noise(0, 2);
-  for (track_sample& s : clip.global.input) {
-    s.x += noise(random);
-    s.y += noise(random);
+// x stands 300 pixels off the centre and y goes to and fro by 40: of rank 1 the first is kept, and
+// 40^2 a sample are left by the first window, by the frames that it moves over, and by a track that
+// is complete from the second position on.
+TEST(MovingFactorizerTest, WhatLiesBeyondTheRankIsLeft) {
+  stabilizer_global global = empty_clip(4, 28);
+  for (int s = 0; s < 4; ++s) {
+    put_track(global, s, s < 3 ? 0 : 4, 28, [](int f) {
+      return point2{kCenterX + 300, kCenterY + (f % 2 ? 40 : -40)};
+    });
   }
-  std::vector<double> matrix;
-  for (int s = 0; s < 15; ++s) {
-    for (int f = 0; f < 20; ++f) matrix.push_back(clip.global.input_at(f, s).x);
-    for (int f = 0; f < 20; ++f) matrix.push_back(clip.global.input_at(f, s).y);
+  build_trajectories(global);
+  const factorization found(global, 1, 0, 300, 20, 4);
+  ASSERT_EQ(found.end(), 28);
+  const double left[][3] = {{0, 1600, 0}, {4, 1600, 1600}, {8, 0, 1600}};
+  ASSERT_EQ(found.factorizer.residuals().size(), 3u);
+  for (int k = 0; k < 3; ++k) {
+    EXPECT_EQ(found.factorizer.residuals()[k].first, left[k][0]);
+    EXPECT_NEAR(found.factorizer.residuals()[k].new_tracks, left[k][1], 1e-6) << k;
+    EXPECT_NEAR(found.factorizer.residuals()[k].new_frames, left[k][2], 1e-6) << k;
   }
-  const int m = 20, n = 30, lwork = 1000;
-  int info = 0;
-  std::vector<double> s(20), u(400), vt(900), work(lwork);
-  lapack::dgesvd("N", "N", &m, &n, matrix.data(), &m, s.data(), u.data(), &m, vt.data(), &n,
-                 work.data(), &lwork, &info);
-  ASSERT_EQ(info, 0);
-  double expected = 0;
-  for (int i = 4; i < 20; ++i) expected += s[i] * s[i];
-
-  const factorization_window window = Factorize(clip.global, 4, 0, 300, 20, 5);
-  EXPECT_EQ(window.end, 20u);
-  double squares = 0;
-  clip.LargestError(window);
-  for (const track_sample& sample : clip.global.output) squares += sample.error * sample.error;
-  EXPECT_NEAR(squares, expected, 1e-5 * expected);
-  for (int i = 0; i < 4; ++i) {
-    double length = 0;
-    for (int f = 0; f < 20; ++f) length += window.basis[i * 20 + f] * window.basis[i * 20 + f];
-    EXPECT_NEAR(length, 1.0, 1e-12) << "signal " << i;
+  found.largest_error(global);
+  for (int f = 0; f < 28; ++f) {
+    EXPECT_NEAR(std::fabs(found.window.basis[f]), std::sqrt(1 / 20.0), 1e-9);
+    EXPECT_NEAR(global.output_at(f, 1).error, 40, 1e-4);
   }
 }
 
 TEST(MovingFactorizerTest, MovingKeepsExactDataExactWhileTracksComeAndGo) {
-  std::vector<life> lives;
+  lives tracks;
   for (int s = 0; s < 60; ++s) {
     const int first = std::max(0, (s * 7) % 260 - 30);
-    lives.push_back({first, std::min(247, first + 60 + (s * 13) % 90)});
+    tracks.push_back({first, std::min(247, first + 60 + (s * 13) % 90)});
   }
-  for (int s = 0; s < 12; ++s) lives.push_back({100 + s, 104 + s});  // under the rank
-  LowRankClip clip(247, 5, lives);
-  moving_factorizer factorizer;
-  ASSERT_TRUE(factorizer.Setup(lives.size(), 247, 5, 40, 5));
-  factorization_window window;
-  EXPECT_EQ(factorizer.Factorize(clip.global, 0, 300, 0, 0, window, kNoProgress), 247u);
-  EXPECT_EQ(window.rank, 5u);
-  EXPECT_EQ(window.basis.size(), 5u * 247u);
-  EXPECT_LT(clip.LargestError(window), 0.02);  // f32 storage, grown over the moves
-  for (std::size_t t = 0; t < clip.global.trajectories.size(); ++t) {
-    const Trajectory& tr = clip.global.trajectories[t];
-    EXPECT_EQ(window.takes_part(t), tr.last - tr.first >= 5) << tr.first << " " << tr.last;
+  for (int s = 0; s < 12; ++s)
+    tracks.push_back({100 + s, 103 + s + s % 2});  // under the rank, at it
+  stabilizer_global global = clip_of(247, tracks);
+  const factorization found(global, 4, 0, 300);
+  EXPECT_EQ(found.end(), 247);
+  EXPECT_EQ(found.window.rank, 4u);
+  EXPECT_EQ(found.window.basis.size(), 4u * 247u);
+  EXPECT_LT(found.largest_error(global), 0.02);  // f32 storage, grown over the moves
+  for (std::size_t t = 0; t < global.trajectories.size(); ++t) {
+    const Trajectory& tr = global.trajectories[t];
+    EXPECT_EQ(found.window.takes_part(t), tr.last - tr.first >= 4) << tr.first << " " << tr.last;
   }
   // One position for each step, the last one shorter by the clip's end.
-  ASSERT_EQ(factorizer.residuals().size(), 1u + 42u);
-  for (const auto& r : factorizer.residuals()) {
+  ASSERT_EQ(found.factorizer.residuals().size(), 1u + 42u);
+  for (const auto& r : found.factorizer.residuals()) {
     EXPECT_LT(r.new_tracks, 1e-4);
     EXPECT_LT(r.new_frames, 1e-4);
   }
 }
 
-TEST(MovingFactorizerTest, TheCentreIsTakenFromThePositions) {
-  LowRankClip clip(60, 3, WholeClip(10, 60));
-  for (track_sample& s : clip.global.input) s.x += 500, s.y -= 300;
-  moving_factorizer factorizer;
-  ASSERT_TRUE(factorizer.Setup(10, 60, 3, 40, 5));
-  factorization_window window;
-  factorizer.Factorize(clip.global, 0, 300, 500, -300, window, kNoProgress);
-  reprojection_errors(clip.global, window, 500, -300);
-  for (const track_sample& s : clip.global.output) EXPECT_LT(s.error, 1e-3);
-}
-
 TEST(MovingFactorizerTest, WhereAWindowEnds) {
-  LowRankClip clip(200, 3, WholeClip(10, 200));
-  EXPECT_EQ(Factorize(clip.global, 3, 0, 300).end, 200u);
-  EXPECT_EQ(Factorize(clip.global, 3, 0, 300, 40, 7).end, 200u);
-  EXPECT_EQ(Factorize(clip.global, 3, 0, 90).end, 90u);
-  EXPECT_EQ(Factorize(clip.global, 3, 0, 94).end, 90u);  // whole steps only
-  EXPECT_EQ(Factorize(clip.global, 3, 10, 94).end, 100u);
-  EXPECT_EQ(Factorize(clip.global, 3, 0, 40).end, 40u);  // no move
-  EXPECT_EQ(Factorize(clip.global, 3, 0, 33).end, 33u);
-  EXPECT_EQ(Factorize(clip.global, 3, 180, 300).end, 200u);
-
-  std::vector<life> lives = WholeClip(1, 200);  // too few for a rank of 3 behind frame 101
-  lives.insert(lives.end(), {{0, 101}, {0, 101}, {0, 101}});
-  LowRankClip fading(200, 3, lives);
-  EXPECT_EQ(Factorize(fading.global, 3, 0, 300).end, 100u);
-  EXPECT_EQ(Factorize(fading.global, 3, 150, 300).end, 150u);  // empty
+  const struct {
+    int first, limit, step, end;
+  } cases[] = {{0, 300, 5, 200}, {0, 300, 7, 200}, {0, 90, 5, 90}, {0, 94, 5, 90},
+               {10, 94, 5, 100}, {0, 40, 5, 40},   {0, 33, 5, 33}, {180, 300, 5, 200}};
+  const stabilizer_global steady = clip_of(200, whole_clip(10, 200));
+  for (const auto& e : cases) {
+    EXPECT_EQ(factorization(steady, 4, e.first, e.limit, 40, e.step).end(), e.end)
+        << e.first << " " << e.limit;
+  }
+  // One track is too few for a rank of 4 behind frame 101.
+  const stabilizer_global fading = clip_of(200, {{0, 200}, {0, 101}, {0, 101}, {0, 101}});
+  EXPECT_EQ(factorization(fading, 4, 0, 300).end(), 100);
+  EXPECT_EQ(factorization(fading, 4, 150, 300).end(), 150);  // empty
 }
 
 TEST(MovingFactorizerTest, AStretchShorterThanTheRankHasNoTracks) {
-  LowRankClip clip(45, 3, WholeClip(10, 45));
-  moving_factorizer factorizer;
-  ASSERT_TRUE(factorizer.Setup(10, 45, 9, 40, 5));
-  factorization_window window;
-  factorizer.Factorize(clip.global, 0, 300, 0, 0, window, kNoProgress);  // leaves its memory used
+  const stabilizer_global global = clip_of(45, whole_clip(10, 45));
+  factorization found(global, 9, 0, 300);  // leaves its memory used
   factorization_window rest;
-  EXPECT_EQ(factorizer.Factorize(clip.global, 40, 300, 0, 0, rest, kNoProgress), 45u);
+  EXPECT_EQ(found.factorizer.Factorize(global, 40, 300, 0, 0, rest, kNoProgress), 45u);
   for (std::size_t t = 0; t < 10; ++t) EXPECT_FALSE(rest.takes_part(t));
   for (std::size_t i = 5; i < 9; ++i) {
     for (std::size_t f = 0; f < 5; ++f) EXPECT_EQ(rest.basis[i * 5 + f], 0.0);
   }
+  EXPECT_FALSE(found.factorizer.Setup(0, 100, 9, 40, 5));
+  EXPECT_TRUE(found.factorizer.error());
 }
 
 TEST(MovingFactorizerTest, RankAboveNineAndAboveTheOverlap) {
-  LowRankClip clip(120, 12, WholeClip(40, 120));
-  EXPECT_LT(clip.LargestError(Factorize(clip.global, 12, 0, 300)), 0.01);
-  const factorization_window window = Factorize(clip.global, 12, 0, 300, 14, 4);
-  EXPECT_EQ(window.end, 120u);  // 10 frames shared, 12 signals: minimum-norm fits
+  synthetic::track_world_options options;
+  options.frame_count = 120;
+  options.slots = 80;
+  options.whole_clip = true;
+  options.gain = 0.2;
+  options.noise = 0;
+  stabilizer_global global = *make_track_world(options).global;
+  build_trajectories(global);
+  const double nine = factorization(global, 9, 0, 300).largest_error(global);
+  EXPECT_LT(factorization(global, 12, 0, 300).largest_error(global), 0.7 * nine);
+  // 10 frames shared, 12 signals: minimum-norm fits.
+  EXPECT_EQ(factorization(global, 12, 0, 300, 14, 4).end(), 120);
 }
 
 TEST(MovingFactorizerTest, AWindowKeepsOnlyWhatMeetsIt) {
-  std::vector<life> lives;
-  for (int s = 0; s < 100; ++s) lives.push_back({s * 4, s * 4 + 80});
-  LowRankClip clip(480, 3, lives);
-  const factorization_window window = Factorize(clip.global, 3, 200, 100);
-  EXPECT_EQ(window.first, 200u);
-  EXPECT_EQ(window.end, 300u);
+  lives tracks;
+  for (int s = 0; s < 100; ++s) tracks.push_back({s * 4, s * 4 + 80});
+  stabilizer_global global = clip_of(480, tracks);
+  const factorization found(global, 4, 200, 100);
+  EXPECT_EQ(found.window.first, 200u);
+  EXPECT_EQ(found.end(), 300);
   for (std::size_t t = 0; t < 100; ++t) {
-    const Trajectory& tr = clip.global.trajectories[t];
-    const bool enough = std::min(tr.last, 300) - std::max(tr.first, 200) >= 3;
-    EXPECT_EQ(window.takes_part(t), enough) << t;
+    const Trajectory& tr = global.trajectories[t];
+    EXPECT_EQ(found.window.takes_part(t), std::min(tr.last, 300) - std::max(tr.first, 200) >= 4);
   }
-  EXPECT_LT(window.trajectory_flags.size(), 50u);
-  EXPECT_LT(clip.LargestError(window), 0.01);
-}
-
-TEST(MovingFactorizerTest, ProgressMayEndIt) {
-  LowRankClip clip(200, 3, WholeClip(10, 200));
-  moving_factorizer factorizer;
-  ASSERT_TRUE(factorizer.Setup(10, 200, 3, 40, 5));
-  int calls = 0;
-  factorization_window window;
-  EXPECT_THROW(factorizer.Factorize(clip.global, 0, 300, 0, 0, window,
-                                    [&] {
-                                      if (++calls == 5) throw std::runtime_error("cancelled");
-                                    }),
-               std::runtime_error);
-  EXPECT_EQ(calls, 5);
-}
-
-TEST(MovingFactorizerTest, NothingToSizeIsASetupError) {
-  moving_factorizer factorizer;
-  EXPECT_FALSE(factorizer.Setup(0, 100, 9, 40, 5));
-  EXPECT_TRUE(factorizer.error());
+  EXPECT_LT(found.window.trajectory_flags.size(), 50u);
+  EXPECT_LT(found.largest_error(global), 0.01);
 }
 
 }  // namespace

@@ -2,17 +2,13 @@
 
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <limits>
-#include <string>
 #include <vector>
 
-#include "platform/tessel/debug.h"
+#include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
-
-const progress_functor kNoProgress = [] {};
 
 // A window with every trajectory flagged, rank 1: basis 1 on every frame, coefficients (10, 20).
 struct Fixture {
@@ -32,9 +28,7 @@ struct Fixture {
       window.coefficients.insert(window.coefficients.end(), {10.0, 20.0});
     }
   }
-  quality_result Check(double threshold = 7.5) {
-    return quality_check(global, window, parameters, threshold, kNoProgress);
-  }
+  quality_result Check() { return quality_check(global, window, parameters, 7.5, kNoProgress); }
   stabilizer_global global;
   factorization_window window;
   SolverParamsRecord parameters;
@@ -82,50 +76,36 @@ TEST(WindowFiltersTest, ShortOverlapsAndOutliersLoseTheirFlag) {
   EXPECT_TRUE(brief.window.takes_part(0));  // as long as the window itself
 }
 
-TEST(WindowFiltersTest, QualityOfWholeClipTracks) {
-  EXPECT_TRUE(Fixture(50, 0, 50, Tracks(500, 0, 50)).Check().passes);
-  EXPECT_TRUE(Fixture(50, 0, 50, Tracks(15, 0, 50)).Check().passes);  // 7.5 exactly
-  const quality_result weak = Fixture(50, 0, 50, Tracks(14, 0, 50)).Check();
-  EXPECT_FALSE(weak.passes);
-  EXPECT_EQ(weak.bad_frame, 1u);
-  EXPECT_EQ(weak.next_good_frame, 49u);
+TEST(WindowFiltersTest, QualityIsTheSumOfTheTracksWeights) {
+  std::vector<Trajectory> groups = Tracks(20, 0, 140);
+  for (const Trajectory& t : Tracks(20, 160, 400)) groups.push_back(t);
+  const struct {
+    const char* situation;
+    std::uint64_t frames, first, end;
+    std::vector<Trajectory> tracks;
+    quality_result expected;
+  } cases[] = {{"strong", 50, 0, 50, Tracks(500, 0, 50), {}},
+               {"7.5 exactly", 50, 0, 50, Tracks(15, 0, 50), {}},
+               {"weak", 50, 0, 50, Tracks(14, 0, 50), {false, 1, 49}},
+               // Over flanks of 100 frames the first group holds 20 (140 - f) / 100 and the second
+               // 20 (f - 159) / 100.
+               {"weak between two groups", 400, 0, 300, groups, {false, 103, 197}},
+               {"under half the overlap of windows", 50, 3, 17, Tracks(500, 0, 50), {false, 3, 17}},
+               {"half the overlap", 50, 3, 18, Tracks(500, 0, 50), {}}};
+  for (const auto& e : cases) {
+    const quality_result found = Fixture(e.frames, e.first, e.end, e.tracks).Check();
+    EXPECT_EQ(found.passes, e.expected.passes) << e.situation;
+    EXPECT_EQ(found.bad_frame, e.expected.bad_frame) << e.situation;
+    EXPECT_EQ(found.next_good_frame, e.expected.next_good_frame) << e.situation;
+  }
 }
 
-TEST(WindowFiltersTest, QualityFindsTheWeakStretch) {
-  // Two groups of long tracks with frames 140 to 159 held by nobody.
-  std::vector<Trajectory> tracks;
-  for (int k = 0; k < 20; ++k) tracks.push_back({k, 0, 0, 140});
-  for (int k = 0; k < 20; ++k) tracks.push_back({k, 0, 160, 400});
-  Fixture f(400, 0, 300, tracks);
-  // The first group fades out from frame 40 (duration 100): 20 (140 - f) / 100 < 7.5 from 103 on;
-  // the second fades in: 20 (f - 159) / 100 >= 7.5 from 197 on.
-  const quality_result r = f.Check();
-  EXPECT_FALSE(r.passes);
-  EXPECT_EQ(r.bad_frame, 103u);
-  EXPECT_EQ(r.next_good_frame, 197u);
-}
-
-TEST(WindowFiltersTest, QualityOfTinyWindows) {
-  const quality_result r = Fixture(50, 3, 17, Tracks(500, 0, 50)).Check();  // 14 frames
-  EXPECT_FALSE(r.passes);
-  EXPECT_EQ(r.bad_frame, 3u);
-  EXPECT_EQ(r.next_good_frame, 17u);
-  EXPECT_TRUE(Fixture(50, 3, 18, Tracks(500, 0, 50)).Check().passes);
-  Fixture none(50, 3, 5, {});
-  none.parameters.factorization_window_overlap = 2;
-  EXPECT_TRUE(none.Check().passes);  // no frame between first and last
-}
-
-TEST(WindowFiltersTest, QualityLogsEachFrame) {
-  std::string log;
-  tessel::debug::DebugDatabase::Set("ShowExperimentalEffectParameters", 1);
-  tessel::debug::SetSink([&](const std::string& text) { log += text; });
+TEST(WindowFiltersTest, QualityLogsEachFrameAndLooksAtThoseBetweenTheEnds) {
+  captured_log log;
   Fixture f(50, 7, 9, Tracks(3, 0, 50));
   f.parameters.factorization_window_overlap = 2;
-  f.Check();
-  tessel::debug::SetSink({});
-  tessel::debug::DebugDatabase::Set("ShowExperimentalEffectParameters", 0);
-  EXPECT_EQ(log, "Frame 7, sum of weights = 1.500000Frame 8, sum of weights = 1.500000");
+  EXPECT_TRUE(f.Check().passes);  // there are none
+  EXPECT_EQ(log.text, "Frame 7, sum of weights = 1.500000Frame 8, sum of weights = 1.500000");
 }
 
 }  // namespace

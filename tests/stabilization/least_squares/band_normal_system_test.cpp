@@ -6,154 +6,106 @@
 #include <limits>
 #include <random>
 
-#include "platform/lapack/lapack.h"
+#include "tests/stabilization/dense_reference.h"
 
 namespace marrow::stabilization {
 namespace {
 
-// J'J of random rows that see `width` consecutive unknowns each; unknowns in `unseen` are left out.
-struct gram {
-  int n;
-  int width;
-  std::vector<double> dense;  // n x n
+using vector = std::vector<double>;
 
-  gram(int size, int reach, int rows_per_start, const std::vector<int>& unseen = {})
-      : n(size), width(reach), dense(size * size) {
+// J'J of random rows that see `width` consecutive unknowns each; those in `unseen` are left out.
+struct gram {
+  std::size_t n, width;
+  dense_reference dense;
+
+  gram(std::size_t size, std::size_t reach, int rows_per_start,
+       const std::vector<std::size_t>& unseen = {})
+      : n(size), width(reach), dense(size) {
     std::mt19937 random(7);
     std::normal_distribution<double> normal;
-    for (int start = 0; start + width <= n; ++start) {
+    for (std::size_t start = 0; start + width <= n; ++start) {
       for (int r = 0; r < rows_per_start; ++r) {
-        std::vector<double> row(n);
-        for (int k = 0; k < width; ++k) row[start + k] = normal(random);
-        for (const int j : unseen) row[j] = 0;
-        for (int i = 0; i < n; ++i)
-          for (int j = 0; j < n; ++j) dense[i * n + j] += row[i] * row[j];
+        std::vector<std::pair<std::size_t, double>> row;
+        for (std::size_t k = start; k < start + width; ++k) row.push_back({k, normal(random)});
+        for (auto& [k, c] : row) {
+          if (std::count(unseen.begin(), unseen.end(), k)) c = 0;
+        }
+        dense.add(1, row, normal(random));
       }
     }
   }
 
-  band_normal_system system() const {
+  double& at(std::size_t i, std::size_t j) { return dense.matrix[i * n + j]; }
+
+  band_normal_system system() {
     band_normal_system s;
     s.resize(n, width - 1);
-    for (int j = 0; j < n; ++j)
-      for (int i = j; i < std::min(n, j + width); ++i) s.at(i, j) = dense[i * n + j];
+    for (std::size_t j = 0; j < n; ++j) {
+      for (std::size_t i = j; i < std::min(n, j + width); ++i) s.at(i, j) = at(i, j);
+    }
     return s;
-  }
-
-  // Minimum-norm solution and rank, by singular values.
-  std::vector<double> reference(std::vector<double> b, int* rank) const {
-    std::vector<double> a = dense;
-    std::vector<double> s(n);
-    std::vector<double> work(50 * n + 1000);
-    const int one = 1, lwork = static_cast<int>(work.size());
-    const double rcond = -1.0;
-    int info = 0;
-    lapack::dgelss(&n, &n, &one, a.data(), &n, b.data(), &n, s.data(), &rcond, rank, work.data(),
-                   &lwork, &info);
-    EXPECT_EQ(info, 0);
-    return b;
-  }
-
-  // A right-hand side in the range.
-  std::vector<double> rhs() const {
-    std::vector<double> b(n);
-    for (int i = 0; i < n; ++i)
-      for (int j = 0; j < n; ++j) b[i] += dense[i * n + j] * std::sin(1.0 + j);
-    return b;
   }
 };
 
-void expect_close(const std::vector<double>& a, const std::vector<double>& b, double tolerance) {
-  ASSERT_EQ(a.size(), b.size());
-  for (std::size_t i = 0; i < a.size(); ++i) EXPECT_NEAR(a[i], b[i], tolerance) << i;
-}
-
-TEST(BandNormalSystem, FullRankGoesByCholeskyAndAgreesWithTheDenseSolution) {
-  const gram g(60, 12, 3);
+// Solution and rank are those of the dense matrix, whichever way they are found.
+void expect_dense_solution(gram& g, bool by_cholesky, std::size_t rank, double tolerance) {
   band_normal_system system = g.system();
   ASSERT_TRUE(system.factorize());
-  EXPECT_TRUE(system.by_cholesky());
-  EXPECT_EQ(system.rank(), 60u);
-  int rank = 0;
-  std::vector<double> x = g.rhs();
-  system.solve(x.data());
-  expect_close(x, g.reference(g.rhs(), &rank), 1e-9);
-  EXPECT_EQ(rank, 60);
-}
-
-TEST(BandNormalSystem, UnseenUnknownsAreZeroAndLowerTheRank) {
-  const gram g(40, 12, 3, {0, 1, 2, 3, 17, 39});
-  band_normal_system system = g.system();
-  ASSERT_TRUE(system.factorize());
-  EXPECT_TRUE(system.by_cholesky());
-  int rank = 0;
-  std::vector<double> b = g.rhs();
-  b[2] = 5;  // outside the range: dropped, as by the pseudo-inverse
-  std::vector<double> x = b;
-  system.solve(x.data());
-  expect_close(x, g.reference(b, &rank), 1e-9);
-  EXPECT_EQ(system.rank(), 34u);
-  EXPECT_EQ(rank, 34);
-  EXPECT_EQ(x[17], 0.0);
-}
-
-TEST(BandNormalSystem, SingularSystemGetsTheMinimumNormSolution) {
-  // Two unknowns that only ever appear as their sum, with exactly representable numbers.
-  gram g(8, 4, 3);
-  for (int i = 0; i < 8; ++i) {
-    for (int j = 0; j < 8; ++j) g.dense[i * 8 + j] = i == j ? 4.0 : 0.0;
+  EXPECT_EQ(system.by_cholesky(), by_cholesky);
+  EXPECT_EQ(system.rank(), rank);
+  std::size_t dense_rank = 0;
+  const vector expected = minimum_norm(g.dense.matrix, g.dense.right, &dense_rank);
+  EXPECT_EQ(dense_rank, rank);
+  for (int turn = 0; turn < 2; ++turn) {
+    vector x = g.dense.right;
+    system.solve(x.data());
+    for (std::size_t i = 0; i < g.n; ++i) EXPECT_NEAR(x[i], expected[i], tolerance) << i;
   }
-  for (const int i : {3, 4})
-    for (const int j : {3, 4}) g.dense[i * 8 + j] = 2.0;
-  band_normal_system system = g.system();
-  ASSERT_TRUE(system.factorize());
-  EXPECT_FALSE(system.by_cholesky());
-  EXPECT_EQ(system.rank(), 7u);
-  std::vector<double> x = {4, 8, 4, 6, 2, 4, 4, 4};
-  int rank = 0;
-  const std::vector<double> expected = g.reference(x, &rank);
-  system.solve(x.data());
-  expect_close(x, expected, 1e-12);
-  EXPECT_NEAR(x[3], 1.0, 1e-12);
-  EXPECT_NEAR(x[4], 1.0, 1e-12);
-  EXPECT_EQ(rank, 7);
 }
 
-TEST(BandNormalSystem, BadScalingShortOfTheRankLimitStaysFullRank) {
-  gram g(20, 4, 4);
-  for (int i = 0; i < 20; ++i)
-    for (int j = 0; j < 20; ++j) g.dense[i * 20 + j] *= (i % 4 ? 1 : 1e5) * (j % 4 ? 1.0 : 1e5);
-  band_normal_system system = g.system();
-  ASSERT_TRUE(system.factorize());
-  EXPECT_TRUE(system.by_cholesky());
-  EXPECT_EQ(system.rank(), 20u);
+TEST(BandNormalSystem, AgreesWithTheDenseMinimumNormSolution) {
+  gram full(60, 12, 3);
+  expect_dense_solution(full, true, 60, 1e-9);
+
+  gram unseen(40, 12, 3, {0, 1, 2, 3, 17, 39});
+  unseen.dense.right[2] = 5;  // outside the range: dropped, as by the pseudo-inverse
+  expect_dense_solution(unseen, true, 34, 1e-9);
+
+  gram scaled(20, 4, 4);  // badly, but short of the rank limit
+  for (std::size_t i = 0; i < 20; ++i) {
+    for (std::size_t j = 0; j < 20; ++j) scaled.at(i, j) *= (i % 4 ? 1 : 1e5) * (j % 4 ? 1.0 : 1e5);
+  }
+  expect_dense_solution(scaled, true, 20, 1e-4);
+
+  // Two unknowns that only ever appear as their sum, with exactly representable numbers.
+  gram sum(8, 4, 0);
+  for (std::size_t i = 0; i < 8; ++i) sum.at(i, i) = i == 3 || i == 4 ? 2 : 4;
+  sum.at(3, 4) = sum.at(4, 3) = 2;
+  sum.dense.right = {4, 8, 4, 6, 2, 4, 4, 4};
+  expect_dense_solution(sum, false, 7, 1e-12);
 }
 
 TEST(BandNormalSystem, LargeSingularSystemIsSolvedInItsRange) {
-  const int n = static_cast<int>(band_normal_system::kLargestDense) + 100;
+  const std::size_t n = band_normal_system::kLargestDense + 100;
   band_normal_system system;
   system.resize(n, 1);
   // A free chain: differences alone are seen, so a common shift is not.
-  for (int i = 0; i + 1 < n; ++i) {
+  vector b(n);
+  const auto truth = [](std::size_t i) { return std::sin(0.1 * static_cast<double>(i)); };
+  for (std::size_t i = 0; i + 1 < n; ++i) {
     if (i == n / 2) continue;
     system.at(i, i) += 1;
     system.at(i + 1, i + 1) += 1;
     system.at(i + 1, i) -= 1;
+    b[i] += truth(i) - truth(i + 1);
+    b[i + 1] += truth(i + 1) - truth(i);
   }
   ASSERT_TRUE(system.factorize());
-  EXPECT_LT(system.rank(), static_cast<std::size_t>(n));
-  std::vector<double> truth(n);
-  for (int i = 0; i < n; ++i) truth[i] = std::sin(0.1 * i);
-  std::vector<double> b(n);
-  for (int i = 0; i + 1 < n; ++i) {
-    if (i == n / 2) continue;
-    b[i] += truth[i] - truth[i + 1];
-    b[i + 1] += truth[i + 1] - truth[i];
-  }
+  EXPECT_EQ(system.rank(), n - 1);
   system.solve(b.data());
-  for (int i = 0; i + 1 < n; ++i) {
+  for (std::size_t i = 0; i + 1 < n; ++i) {
     if (i == n / 2) continue;
-    EXPECT_NEAR(b[i + 1] - b[i], truth[i + 1] - truth[i], 1e-6) << i;
+    EXPECT_NEAR(b[i + 1] - b[i], truth(i + 1) - truth(i), 1e-6) << i;
   }
 }
 

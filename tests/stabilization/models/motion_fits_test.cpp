@@ -3,8 +3,9 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <random>
 
-#include "tests/stabilization/displacement_lists.h"
+#include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
@@ -16,59 +17,59 @@ TEST(TranslationFitTest, IsTheWeightedMean) {
   EXPECT_TRUE(std::isnan(meanTranslation({}).x));
 }
 
-TEST(SimilarityFitTest, RecoversScaleTurnAndShiftInTheRightSense) {
-  const matrix3 truth = similarity_matrix(1.2, 0.1, 3, -4);
-  std::vector<Displacement> list;
-  double weight = 1;
-  for (const point2 p : {point2{0, 0}, point2{10, 0}, point2{0, 10}, point2{10, 10}}) {
-    list.push_back(displacement(p, transform(truth, p), weight++));
+TEST(SimilarityFitTest, WorkedLists) {
+  const matrix3 turned = similarity_matrix(1.2, 0.1, 3, -4);
+  const struct {
+    const char* situation;
+    std::vector<Displacement> list;
+    matrix3 expected;
+  } cases[] = {
+      {"exact",
+       {displacement({0, 0}, {3, -4}, 1), displacement({10, 0}, transform(turned, {10, 0}), 2),
+        displacement({0, 10}, transform(turned, {0, 10}), 3)},
+       turned},
+      {"noisy, with weights",
+       {displacement({0, 0}, {1, 1}, 1), displacement({4, 0}, {1, 5}, 1),
+        displacement({0, 2}, {-1.5, 1}, 2)},
+       similarity_matrix(1.06433665, 1.51204050, 0.75, 0.875)},
+      {"mirrored targets are turned",
+       {displacement({0, 0}, {0, 0}), displacement({4, 0}, {-4, 0}), displacement({0, 2}, {0, 2})},
+       {-.6, .4, -.8, -.4, -.6, 4.8 / 3, 0, 0, 1}},
+      {"collinear",
+       {displacement({0, 0}, {1, 0}), displacement({1, 0}, {3, 0}), displacement({2, 0}, {5, 0})},
+       similarity_matrix(2, 0, 1, 0)}};
+  for (const auto& e : cases) {
+    SCOPED_TRACE(e.situation);
+    expect_matrix_near(fitSimilarity(e.list), e.expected, 1e-7);
   }
-  expect_matrix_near(fitSimilarity(list), truth, 1e-12);
-}
-
-TEST(SimilarityFitTest, NoisyPointsWithWeights) {
-  const std::vector<Displacement> list = {displacement({0, 0}, {1, 1}, 1),
-                                          displacement({4, 0}, {1, 5}, 1),
-                                          displacement({0, 2}, {-1.5, 1}, 2)};
-  expect_matrix_near(fitSimilarity(list), similarity_matrix(1.06433665, 1.51204050, 0.75, 0.875),
-                     1e-7);
-}
-
-TEST(SimilarityFitTest, MirroredTargetsAreTurnedNotMirrored) {
-  const std::vector<Displacement> list = {
-      displacement({0, 0}, {0, 0}), displacement({4, 0}, {-4, 0}), displacement({0, 2}, {0, 2})};
-  const matrix3 m = fitSimilarity(list);
-  const double s = 0.72111026;
-  EXPECT_NEAR(m[0], s * -.83205029, 1e-7);
-  EXPECT_NEAR(m[1], s * .55470020, 1e-7);
-  EXPECT_NEAR(m[3], s * -.55470020, 1e-7);
-  EXPECT_NEAR(m[4], s * -.83205029, 1e-7);
-}
-
-TEST(SimilarityFitTest, DegenerateLists) {
   const std::vector<Displacement> one_place(3, displacement({5, 6}, {8, 8}));
-  const point2 image = transform(fitSimilarity(one_place), {5, 6});
-  EXPECT_NEAR(image.x, 8, 1e-12);
-  EXPECT_NEAR(image.y, 8, 1e-12);
-  const std::vector<Displacement> collinear = {
-      displacement({0, 0}, {1, 0}), displacement({1, 0}, {3, 0}), displacement({2, 0}, {5, 0})};
-  expect_matrix_near(fitSimilarity(collinear), similarity_matrix(2, 0, 1, 0), 1e-12);
+  expect_point_near(transform(fitSimilarity(one_place), {5, 6}), {8, 8}, 1e-12);
   const std::vector<Displacement> weightless(3, displacement({5, 6}, {8, 8}, 0));
   EXPECT_TRUE(std::isnan(fitSimilarity(weightless)[0]));
+}
+
+// Random sources over a frame, targets under m.
+std::vector<Displacement> displacements_under(const matrix3& m, int count) {
+  std::mt19937 random(7);
+  std::uniform_real_distribution<double> unit(0, 1);
+  std::vector<Displacement> list;
+  for (int i = 0; i < count; ++i) {
+    const point2 p = {unit(random) * 1919, unit(random) * 1079};
+    list.push_back(displacement(p, transform(m, p), 0.2 + 0.8 * unit(random)));
+  }
+  return list;
 }
 
 TEST(HomographyFitTest, ExactTargetsGiveTheMatrix) {
   const matrix3 truth = {1.02, 0.03, 5, -0.01, 0.98, -7, 1e-5, -2e-5, 1};
   homography_fitter fitter;
   for (const int count : {400, 8, 4}) {  // shrinking lists reuse the arrays
-    const auto list = displacements_under(truth, count, 1920, 1080, 7);
+    const auto list = displacements_under(truth, count);
     const matrix3 m = fitter.fit(list);
     for (const Displacement& d : list) {
-      const point2 p = transform(m, {d.sourceX, d.sourceY});
-      EXPECT_NEAR(p.x, d.targetX, 1e-7);
-      EXPECT_NEAR(p.y, d.targetY, 1e-7);
+      expect_point_near(transform(m, {d.sourceX, d.sourceY}), {d.targetX, d.targetY}, 1e-7);
     }
-    if (count == 400) expect_matrix_near(m, truth, 1e-10);
+    if (count == 400) expect_matrix_near(m, truth, 1e-9);
   }
 }
 
@@ -84,7 +85,7 @@ TEST(HomographyFitTest, WeightMultipliesTheRows) {
 }
 
 TEST(HomographyFitTest, TooFewPointsStillGiveAMatrixThroughThem) {
-  const auto list = displacements_under(similarity_matrix(1, 0, 3, 4), 2, 1920, 1080);
+  const auto list = displacements_under(similarity_matrix(1, 0, 3, 4), 2);
   const matrix3 m = fitHomography(list);
   for (const Displacement& d : list) {
     EXPECT_NEAR(transform(m, {d.sourceX, d.sourceY}).x, d.targetX, 1e-3);

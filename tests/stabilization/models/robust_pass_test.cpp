@@ -5,7 +5,7 @@
 #include <cmath>
 
 #include "stabilization/warp/model_scores.h"
-#include "tests/stabilization/displacement_lists.h"
+#include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
@@ -19,27 +19,27 @@ void push(std::vector<Displacement>& list, double push, double radius = 1000) {
   list.push_back(displacement({0, -radius}, {0, -radius + push}));
 }
 
-TEST(MedianDeviationTest, UnitIsHalfAPixelAtLeast) {
-  std::vector<Displacement> list;
-  for (int i = 0; i < 6; ++i) push(list, 0.2);
-  for (const double far : {1.49, 1.6, 2.3, 2.376}) push(list, far);
-  EXPECT_NEAR(medianDeviation(list), 0.2, 1e-9);
-  const double weight[] = {1, 0.67032005, 0.04076220, 0};
-  for (int k = 0; k < 4; ++k) {
-    EXPECT_NEAR(list[24 + 4 * k].weight, weight[k], 1e-6) << k;
-    EXPECT_EQ(list[24 + 4 * k].outlier, k > 0) << k;
+// Groups of four, `calm` of them near the fit and four further away each. The unit is the median or
+// half a pixel; weights fall from three units on and are gone from 4.75 on.
+TEST(MedianDeviationTest, WeightsFallWithTheDistanceInUnits) {
+  const struct {
+    int calm;
+    double median;
+    std::vector<std::pair<double, double>> far;  // distance, weight
+  } cases[] = {{6, 0.2, {{1.49, 1}, {1.6, .67032005}, {2.3, .04076220}, {2.376, 0}}},
+               {4, 1.5, {{4.49, 1}, {6.0, .13533528}, {7.2, 0}}}};
+  for (const auto& e : cases) {
+    std::vector<Displacement> list;
+    for (int i = 0; i < e.calm; ++i) push(list, e.median);
+    for (const auto& [distance, weight] : e.far) push(list, distance);
+    EXPECT_NEAR(medianDeviation(list), e.median, 1e-9);
+    EXPECT_EQ(list[0].weight, 1);
+    for (std::size_t k = 0; k < e.far.size(); ++k) {
+      const Displacement& d = list[4 * (e.calm + k)];
+      EXPECT_NEAR(d.weight, e.far[k].second, 1e-6) << e.far[k].first;
+      EXPECT_EQ(d.outlier, e.far[k].second < 1) << e.far[k].first;
+    }
   }
-  EXPECT_EQ(list[0].weight, 1);
-}
-
-TEST(MedianDeviationTest, UnitIsTheMedian) {
-  std::vector<Displacement> list;
-  for (int i = 0; i < 4; ++i) push(list, 1.5);
-  for (const double far : {4.49, 6.0, 7.2}) push(list, far);
-  EXPECT_NEAR(medianDeviation(list), 1.5, 1e-9);
-  EXPECT_FALSE(list[16].outlier);
-  EXPECT_NEAR(list[20].weight, 0.13533528, 1e-6);
-  EXPECT_EQ(list[24].weight, 0);
 }
 
 TEST(MedianDeviationTest, ShortAndWeightlessListsAreLeftAlone) {
@@ -69,25 +69,26 @@ displacement_lists one_track(int frames, int outlier, double weight) {
   return lists;
 }
 
-TEST(FadeAboutOutliersTest, WeightReturnsOverSixtyFramesOnBothSides) {
-  displacement_lists lists = one_track(200, 100, 0.0);
-  fade_about_outliers(lists, 0, 200, 60);
-  for (const int side : {-1, 1}) {
-    EXPECT_NEAR(lists[100 + side][0].weight, 1.0 / 60, 1e-15);
-    EXPECT_NEAR(lists[100 + 30 * side][0].weight, 0.5, 1e-15);
-    EXPECT_EQ(lists[100 + 60 * side][0].weight, 1);
-    EXPECT_EQ(lists[100 + 61 * side][0].weight, 1);
+TEST(FadeAboutOutliersTest, WeightReturnsOverSixtyFramesInsideTheRangeAndTheTrack) {
+  const struct {
+    int first, end, track_end;
+    double outlier;
+    std::vector<std::pair<int, double>> weights;  // of frames
+  } cases[] = {{0,
+                200,
+                200,
+                0,
+                {{99, 1 / 60.}, {101, 1 / 60.}, {70, .5}, {130, .5}, {40, 1}, {160, 1}, {161, 1}}},
+               {90, 110, 104, .25, {{103, .3}, {104, 1}, {90, 10 / 60. + .25}, {89, 1}}},
+               {90, 103, 200, .25, {{102, 2 / 60. + .25}, {103, 1}}}};
+  for (const auto& e : cases) {
+    displacement_lists lists = one_track(200, 100, e.outlier);
+    lists[e.track_end - 1][0].nextIndex = -1;
+    fade_about_outliers(lists, e.first, e.end, 60);
+    for (const auto& [frame, weight] : e.weights) {
+      EXPECT_NEAR(lists[frame][0].weight, weight, 1e-15) << frame;
+    }
   }
-}
-
-TEST(FadeAboutOutliersTest, StaysInsideTheRangeAndStopsWhereTheTrackEnds) {
-  displacement_lists lists = one_track(200, 100, 0.25);
-  lists[103][0].nextIndex = -1;
-  fade_about_outliers(lists, 90, 110, 60);
-  EXPECT_NEAR(lists[103][0].weight, 0.3, 1e-15);
-  EXPECT_EQ(lists[104][0].weight, 1);
-  EXPECT_NEAR(lists[90][0].weight, 10.0 / 60 + 0.25, 1e-15);
-  EXPECT_EQ(lists[89][0].weight, 1);
 }
 
 TEST(RampScoresTest, OneLimitedFrameIsApproachedOverFifteenFramesAStep) {

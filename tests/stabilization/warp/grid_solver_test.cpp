@@ -5,84 +5,59 @@
 #include <cmath>
 #include <random>
 
-#include "tests/stabilization/displacement_lists.h"
+#include "tests/stabilization/clips.h"
+#include "tests/stabilization/dense_reference.h"
 
 namespace marrow::stabilization {
 namespace {
 
-// The problem as it is stated: one equation after the other into dense normal equations.
-class dense_problem {
- public:
-  explicit dense_problem(int unknowns) : n_(unknowns), a_(n_ * n_), b_(n_) {}
-
-  void equation(double weight, const std::vector<std::pair<int, double>>& terms, double right) {
-    for (const auto& [i, ci] : terms) {
-      for (const auto& [j, cj] : terms) a_[i * n_ + j] += weight * ci * cj;
-      b_[i] += weight * ci * right;
-    }
-  }
-
-  std::vector<double> solve() {
-    for (int k = 0; k < n_; ++k) {
-      for (int i = k + 1; i < n_; ++i) {
-        const double factor = a_[i * n_ + k] / a_[k * n_ + k];
-        for (int j = k; j < n_; ++j) a_[i * n_ + j] -= factor * a_[k * n_ + j];
-        b_[i] -= factor * b_[k];
-      }
-    }
-    for (int k = n_ - 1; k >= 0; --k) {
-      for (int j = k + 1; j < n_; ++j) b_[k] -= a_[k * n_ + j] * b_[j];
-      b_[k] /= a_[k * n_ + k];
-    }
-    return b_;
-  }
-
- private:
-  int n_;
-  std::vector<double> a_, b_;
-};
-
 std::vector<double> reference(int cols, int rows, const std::vector<Displacement>& list,
                               const std::vector<double>& shape, double data_weight) {
-  dense_problem problem(2 * cols * rows);
+  dense_reference problem(2 * cols * rows);
   double largest = 0;
   for (const Displacement& d : list) largest = std::max(largest, d.weight);
   for (const Displacement& d : list) {
-    const int tl = d.cellY * cols + d.cellX;
-    const int corner[4] = {tl, tl + 1, tl + cols, tl + cols + 1};
-    const double b[4] = {(1 - d.fracX) * (1 - d.fracY), d.fracX * (1 - d.fracY),
-                         (1 - d.fracX) * d.fracY, d.fracX * d.fracY};
-    for (int axis = 0; axis < 2; ++axis) {
-      std::vector<std::pair<int, double>> terms;
-      for (int i = 0; i < 4; ++i) terms.push_back({2 * corner[i] + axis, b[i]});
-      problem.equation(data_weight / largest * d.weight, terms, axis ? d.targetY : d.targetX);
+    const std::size_t tl = d.cellY * cols + d.cellX;
+    for (const std::size_t axis : {0, 1}) {
+      problem.add(data_weight / largest * d.weight,
+                  {{2 * tl + axis, (1 - d.fracX) * (1 - d.fracY)},
+                   {2 * (tl + 1) + axis, d.fracX * (1 - d.fracY)},
+                   {2 * (tl + cols) + axis, (1 - d.fracX) * d.fracY},
+                   {2 * (tl + cols + 1) + axis, d.fracX * d.fracY}},
+                  axis ? d.targetY : d.targetX);
     }
   }
-  const auto at = [&](int v) { return point2{shape[2 * v], shape[2 * v + 1]}; };
-  for (int r = 0; r + 1 < rows; ++r) {
-    for (int c = 0; c + 1 < cols; ++c) {
-      const int TL = r * cols + c, TR = TL + 1, BL = TL + cols, BR = BL + 1;
-      const int triangles[4][3] = {{TL, BL, BR}, {BL, BR, TR}, {BR, TR, TL}, {TR, TL, BL}};
-      for (const auto& t : triangles) {
-        const auto [r1, s1] = shape_of_triangle(at(t[0]), at(t[1]), at(t[2]));
-        const int x0 = 2 * t[0], x1 = 2 * t[1], x2 = 2 * t[2];
-        problem.equation(200, {{x0, -1}, {x1, 1 - r1}, {x2, r1}, {x2 + 1, s1}, {x1 + 1, -s1}}, 0);
-        problem.equation(200, {{x0 + 1, -1}, {x1 + 1, 1 - r1}, {x2 + 1, r1}, {x1, s1}, {x2, -s1}},
-                         0);
-      }
+  const auto at = [&](std::size_t v) { return point2{shape[2 * v], shape[2 * v + 1]}; };
+  for (std::size_t TL = 0; TL + cols + 1 < shape.size() / 2; ++TL) {
+    if (TL % cols + 1 == static_cast<std::size_t>(cols)) continue;
+    const std::size_t TR = TL + 1, BL = TL + cols, BR = BL + 1;
+    const std::size_t triangles[4][3] = {{TL, BL, BR}, {BL, BR, TR}, {BR, TR, TL}, {TR, TL, BL}};
+    for (const auto& [a, b, c] : triangles) {
+      const auto [r, s] = shape_of_triangle(at(a), at(b), at(c));
+      const std::size_t x0 = 2 * a, x1 = 2 * b, x2 = 2 * c;
+      problem.add(200, {{x0, -1}, {x1, 1 - r}, {x2, r}, {x2 + 1, s}, {x1 + 1, -s}}, 0);
+      problem.add(200, {{x0 + 1, -1}, {x1 + 1, 1 - r}, {x2 + 1, r}, {x1, s}, {x2, -s}}, 0);
     }
   }
   return problem.solve();
 }
 
+TEST(TriangleShapeTest, PutsTheFirstCornerFromTheOtherTwo) {
+  const point2 p[] = {{0, 0}, {-1, 31}, {31, 33}, {30, 1}};
+  for (int k = 0; k < 4; ++k) {
+    const point2 p0 = p[k], p1 = p[(k + 1) % 4], p2 = p[(k + 2) % 4];
+    const triangle_shape t = shape_of_triangle(p0, p1, p2);
+    const point2 b = {p2.x - p1.x, p2.y - p1.y};
+    expect_point_near({p1.x + t.r * b.x + t.s * b.y, p1.y + t.r * b.y - t.s * b.x}, p0, 1e-12);
+  }
+}
+
 // A grid of 30-pixel cells under m, and displacements all over it with targets off by up to 5.
 struct Scene {
-  Scene(int cols, int rows, const matrix3& m) : shape(2 * cols * rows) {
-    for (int v = 0; v < cols * rows; ++v) {
-      const point2 p = transform(m, {30.0 * (v % cols), 30.0 * (v / cols)});
-      shape[2 * v] = p.x;
-      shape[2 * v + 1] = p.y;
-    }
+  Scene(int cols, int rows, const matrix3& m)
+      : shape(grid_over(30 * cols - 29, 30 * rows - 29, cols, rows, [&](point2 p) {
+                return transform(m, p);
+              }).values) {
     std::mt19937 random(5);
     std::uniform_real_distribution<double> unit(0, 1);
     for (int i = 0; i < 40; ++i) {

@@ -5,21 +5,15 @@
 #include <limits>
 #include <random>
 
+#include "tests/stabilization/clips.h"
+
 namespace marrow::stabilization {
 namespace {
 
 // The unit grid of cols x rows over width x height under m.
-VarVector grid_under(const matrix3& m, int cols = 64, int rows = 36, double width = 1919,
-                     double height = 1079) {
-  VarVector grid(cols, rows);
-  for (int r = 0; r < rows; ++r) {
-    for (int c = 0; c < cols; ++c) {
-      const point2 p = transform(m, {c * width / (cols - 1), r * height / (rows - 1)});
-      grid.values[2 * (r * cols + c)] = p.x;
-      grid.values[2 * (r * cols + c) + 1] = p.y;
-    }
-  }
-  return grid;
+VarVector grid_under(const matrix3& m, int cols = 64, int rows = 36, int width = 1920,
+                     int height = 1080) {
+  return grid_over(width, height, cols, rows, [&](point2 p) { return transform(m, p); });
 }
 
 VarVector stored(const VarVector& grid) {
@@ -30,7 +24,7 @@ TEST(QuantiseTest, OffsetsRoundHalfAwayFromZero) {
   const double offsets[] = {.5 / 256, -.5 / 256, .0019, .3, 1.0 / 3, -1.0 / 3};
   const int steps[] = {1, -1, 0, 77, 85, -85};
   for (int i = 0; i < 6; ++i) {
-    VarVector grid = grid_under(identity3, 3, 3, 2, 2);
+    VarVector grid = grid_under(identity3, 3, 3, 3, 3);
     grid.values[2 * 4] += offsets[i];      // the inner vertex, x
     grid.values[2 * 5 + 1] += offsets[i];  // the right edge's middle, y
     const quantised_warp q = quantise(grid);
@@ -73,7 +67,7 @@ TEST(QuantiseTest, StoringTwiceChangesNoBit) {
 }
 
 TEST(QuantiseTest, HopelessRecordsDoNotTrap) {
-  VarVector grid = grid_under(identity3, 3, 3, 2, 2);
+  VarVector grid = grid_under(identity3, 3, 3, 3, 3);
   grid.values[8] = 1e30;
   grid.values[9] = std::numeric_limits<double>::quiet_NaN();
   const quantised_warp q = quantise(grid);
