@@ -207,6 +207,35 @@ TEST_F(RendererTest, EachFieldIsRenderedAtItsTime) {
   }
 }
 
+// Whatever becomes of a parameter meanwhile, a render has the one that it began with.
+TEST_F(RendererTest, ParametersStayAsTheyWereWhenTheRenderBegan) {
+  TearDown();
+  on[HX_CMD_DECLARE_PARAMS] = [](const Call& call) -> HX_Err {
+    HX_ParamDef amount{20, HX_PARAM_FLOAT_SLIDER, "Amount", 0, 0, 0, {}};
+    amount.u.fs.value = 5;
+    call.out->num_params = 2;
+    return call.cb().add_param(nullptr, -1, &amount);
+  };
+  std::vector<double> seen;
+  on[HX_CMD_RENDER_FRAME] = on[HX_CMD_RENDER_PLANNED_FRAME] = [&](const Call& call) -> HX_Err {
+    const HX_InData& in = *call.in;
+    HX_ParamDef amount = *call.params[1];
+    Suite<HX_ParamUtilsSuite3> utils(call, HX_PARAM_UTILS_SUITE, 3);
+    amount.u.fs.value += 1;
+    EXPECT_EQ(utils->SetParamValue(in.effect_ref, 1, &amount), HX_ERR_NONE);
+    call.cb().checkout_param(in.effect_ref, 1, in.current_time, in.time_step, in.time_scale,
+                             &amount);
+    seen.push_back(amount.u.fs.value);
+    call.cb().checkin_param(in.effect_ref, &amount);
+    return HX_ERR_NONE;
+  };
+  Start();
+  effect = &session->Apply(MakeDrawnLayer());
+  renderer = effect->MakeRenderer();
+  for (const bool direct : {true, false}) Render(direct, {1});
+  EXPECT_EQ(seen, (std::vector<double>{5, 6}));
+}
+
 TEST_F(RendererTest, RenderersWorkAtOnceWhileTheEffectTicksAndSaves) {
   std::vector<std::jthread> threads;
   for (int t = 0; t < 3; ++t) {

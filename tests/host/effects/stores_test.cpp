@@ -27,6 +27,8 @@ TEST_F(StoresTest, BlocksMoveWhenTheLastLockGoes) {
   handles.Unlock(handle);
   EXPECT_EQ(std::memcmp(first, "\1\2\3", 3), 0);  // still locked once
   handles.Unlock(handle);
+  EXPECT_NE(handles.Lock(handle), first);
+  handles.Unlock(handle);
   EXPECT_EQ(handles.BytesOf(handle), (std::vector<std::uint8_t>{1, 2, 3}));
   EXPECT_EQ(handles.Resize(handle, 5), 0);
   EXPECT_EQ(handles.BytesOf(handle), (std::vector<std::uint8_t>{1, 2, 3, 0, 0}));
@@ -74,6 +76,14 @@ TEST_F(StoresTest, WritingBehindARowIsFoundWhenTheWorldGoes) {
 // told that it was the last.
 TEST_F(StoresTest, OpaqueDataStandsOnceWhoeverComesFirst) {
   OpaqueStore store;
+  int first_block = 0, second_block = 0;
+  EXPECT_EQ(store.Set(7, &first_block), &first_block);
+  EXPECT_EQ(store.Set(7, &second_block), &first_block);
+  EXPECT_EQ(store.Find(7), &first_block);
+  EXPECT_FALSE(store.Release(7));
+  EXPECT_FALSE(store.Release(7));
+  EXPECT_TRUE(store.Release(7));
+  EXPECT_EQ(store.Find(7), nullptr);
   std::atomic<int> blocks{0};
   const auto work = [&] {
     for (int i = 0; i < 3000; ++i) {
