@@ -1,8 +1,6 @@
 #include "host/effects/renderer.h"
 
-#include <atomic>
 #include <cmath>
-#include <thread>
 #include <vector>
 
 #include "host/pixels/world_operations.h"
@@ -105,7 +103,7 @@ class RendererTest : public ProbeTest {
     return direct ? renderer->Direct(request) : renderer->Planned(request);
   }
 
-  std::atomic<int> margin = 0, offset = 0;  // pixels on each side; frames
+  int margin = 0, offset = 0;  // pixels on each side; frames
   Effect* effect = nullptr;
   std::unique_ptr<Renderer> renderer;
 };
@@ -234,27 +232,6 @@ TEST_F(RendererTest, ParametersStayAsTheyWereWhenTheRenderBegan) {
   renderer = effect->MakeRenderer();
   for (const bool direct : {true, false}) Render(direct, {1});
   EXPECT_EQ(seen, (std::vector<double>{5, 6}));
-}
-
-TEST_F(RendererTest, RenderersWorkAtOnceWhileTheEffectTicksAndSaves) {
-  std::vector<std::jthread> threads;
-  for (int t = 0; t < 3; ++t) {
-    threads.emplace_back([this, t] {
-      const auto own = effect->MakeRenderer();
-      for (int i = 0; i < 40; ++i) {
-        const int frame = (i + t) % kClipFrames;
-        const RenderedFrame rendered =
-            i % 2 ? own->Direct({frame}) : own->Planned({frame, 8, {1, 2}});
-        EXPECT_TRUE(rendered.pixels);
-        EXPECT_EQ(At(*rendered.OnLayer(), 2, 2)[0], frame * 20);
-      }
-    });
-  }
-  SavedEffect saved;
-  for (int i = 0; i < 40; ++i) {
-    session->Tick();
-    EXPECT_TRUE(effect->Save(&saved).ok());
-  }
 }
 
 }  // namespace
