@@ -1,8 +1,6 @@
 #include "host/effects/renderer.h"
 
-#include <atomic>
 #include <cmath>
-#include <thread>
 #include <vector>
 
 #include "host/pixels/world_operations.h"
@@ -105,7 +103,7 @@ class RendererTest : public ProbeTest {
     return direct ? renderer->Direct(request) : renderer->Planned(request);
   }
 
-  std::atomic<int> margin = 0, offset = 0;  // pixels on each side; frames
+  int margin = 0, offset = 0;  // pixels on each side; frames
   Effect* effect = nullptr;
   std::unique_ptr<Renderer> renderer;
 };
@@ -207,25 +205,33 @@ TEST_F(RendererTest, EachFieldIsRenderedAtItsTime) {
   }
 }
 
-TEST_F(RendererTest, RenderersWorkAtOnceWhileTheEffectTicksAndSaves) {
-  std::vector<std::jthread> threads;
-  for (int t = 0; t < 3; ++t) {
-    threads.emplace_back([this, t] {
-      const auto own = effect->MakeRenderer();
-      for (int i = 0; i < 40; ++i) {
-        const int frame = (i + t) % kClipFrames;
-        const RenderedFrame rendered =
-            i % 2 ? own->Direct({frame}) : own->Planned({frame, 8, {1, 2}});
-        EXPECT_TRUE(rendered.pixels);
-        EXPECT_EQ(At(*rendered.OnLayer(), 2, 2)[0], frame * 20);
-      }
-    });
-  }
-  SavedEffect saved;
-  for (int i = 0; i < 40; ++i) {
-    session->Tick();
-    EXPECT_TRUE(effect->Save(&saved).ok());
-  }
+// Whatever becomes of a parameter meanwhile, a render has the one that it began with.
+TEST_F(RendererTest, ParametersStayAsTheyWereWhenTheRenderBegan) {
+  TearDown();
+  on[HX_CMD_DECLARE_PARAMS] = [](const Call& call) -> HX_Err {
+    HX_ParamDef amount{20, HX_PARAM_FLOAT_SLIDER, "Amount", 0, 0, 0, {}};
+    amount.u.fs.value = 5;
+    call.out->num_params = 2;
+    return call.cb().add_param(nullptr, -1, &amount);
+  };
+  std::vector<double> seen;
+  on[HX_CMD_RENDER_FRAME] = on[HX_CMD_RENDER_PLANNED_FRAME] = [&](const Call& call) -> HX_Err {
+    const HX_InData& in = *call.in;
+    HX_ParamDef amount = *call.params[1];
+    Suite<HX_ParamUtilsSuite3> utils(call, HX_PARAM_UTILS_SUITE, 3);
+    amount.u.fs.value += 1;
+    EXPECT_EQ(utils->SetParamValue(in.effect_ref, 1, &amount), HX_ERR_NONE);
+    call.cb().checkout_param(in.effect_ref, 1, in.current_time, in.time_step, in.time_scale,
+                             &amount);
+    seen.push_back(amount.u.fs.value);
+    call.cb().checkin_param(in.effect_ref, &amount);
+    return HX_ERR_NONE;
+  };
+  Start();
+  effect = &session->Apply(MakeDrawnLayer());
+  renderer = effect->MakeRenderer();
+  for (const bool direct : {true, false}) Render(direct, {1});
+  EXPECT_EQ(seen, (std::vector<double>{5, 6}));
 }
 
 }  // namespace

@@ -88,6 +88,8 @@ TEST_F(SessionTest, WorkRunsInTicksUntilItSettles) {
   EXPECT_EQ(session->TickUntilSettled(1h, [&] { return Session::StatusOf(effect) == 5; }),
             Session::Wait::stopped);
   EXPECT_EQ(Session::WorkOf(effect), Session::Work::solving);
+  session->Tick();
+  EXPECT_EQ(Session::WorkOf(effect), Session::Work::solving);
   EXPECT_EQ(session->TickUntilSettled(1h), Session::Wait::settled);
   EXPECT_EQ(*ValueOf(*effect.Param(kStatus)), 508);
   statuses = {604};

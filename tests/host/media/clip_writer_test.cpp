@@ -136,19 +136,6 @@ TEST_F(ClipTest, TinyAndOddSizesKeepTheirSize) {
   }
 }
 
-TEST_F(ClipTest, TransparentPixelsAreBlackWithoutAlpha) {
-  EncodeSettings settings;
-  settings.codec = "ffv1";
-  settings.pixel_format = "yuv444p";
-  const auto writer = ClipWriter::Create(In("a.mkv"), Made(16, 16, 1), 16, 16, settings);
-  WriteFrame(*writer, 0, 16, std::vector<HX_Pixel8>(256, {128, 255, 255, 255}));
-  WriteFrame(*writer, 1, 16, std::vector<HX_PixelFloat>(256, {0, 1, 1, 1}));
-  writer->Finish();
-  const auto reader = ClipReader::Open(In("a.mkv"));
-  EXPECT_NEAR(ReadFrame<HX_Pixel8>(*reader, 0)[100].green, 128, 1);
-  EXPECT_EQ(ReadFrame<HX_Pixel8>(*reader, 1)[100].green, 0);
-}
-
 TEST_F(ClipTest, RefusalsNameTheFileAndLeaveNothing) {
   WriteOneFrame(In("in.mkv"), Made(16, 16, 1), {});
   std::filesystem::create_symlink(In("in.mkv"), In("link.mkv"));

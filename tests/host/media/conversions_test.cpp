@@ -274,7 +274,7 @@ const Case kCases[] = {
     {AV_PIX_FMT_YUVA420P, 30, 18, Tags(2, 2, 0), 0.299, 0.114, true, 0, 0.5, 1.6, 0.004},
     {AV_PIX_FMT_YUV420P10, 66, 34, Tags(9, 1, 2), 0.2627, 0.0593, false, 0.5, 0.5, 1.6, 0.002},
     {AV_PIX_FMT_YUV422P10, 70, 20, Tags(1, 2, 1), 0.2126, 0.0722, true, 0, 0, 1.6, 0.002},
-    {AV_PIX_FMT_YUVA444P10, 37, 20, Tags(1, 1, 0), 0.2126, 0.0722, false, 0, 0, 1.6, 1e-3},
+    {AV_PIX_FMT_YUVA444P10, 37, 20, Tags(1, 1, 0), 0.2126, 0.0722, false, 0, 0, 2, 1e-3},
     {AV_PIX_FMT_YUV444P12, 37, 20, Tags(10, 1, 0), 0.2627, 0.0593, false, 0, 0, 1, 2e-5},
     {AV_PIX_FMT_YUV444P16, 1, 3, Tags(6, 1, 0), 0.299, 0.114, false, 0, 0, 0.6, 2e-5},
     {AV_PIX_FMT_YUV444P16, 4, 3, Tags(6, 2, 0), 0.299, 0.114, true, 0, 0, 0.6, 2e-5},

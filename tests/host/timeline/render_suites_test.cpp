@@ -1,6 +1,5 @@
 #include <atomic>
 #include <map>
-#include <random>
 #include <thread>
 
 #include "platform/tessel/threads.h"
@@ -325,52 +324,6 @@ TEST_F(RenderSuitesTest, ShutdownAnswersAllAndRefusesMore) {
   }
   EXPECT_NE(Ask(node, 0, late), HX_ERR_NONE);
   EXPECT_EQ(Input(0)->width(), 6) << "renders of the host still work";
-}
-
-// A job's protocol on several threads: reference, request, wait or cancel, read, dereference; with
-// the layer changing and the cache too small beside them.
-TEST_F(RenderSuitesTest, JobsRequestCancelAndReadBesideChanges) {
-  services.SetCacheBytes(500);  // five frames
-  constexpr int kJobs = 3, kRounds = 150;
-  std::atomic<int> read = 0;
-  const auto work = [&](unsigned seed) {
-    std::mt19937 random(seed);
-    for (int round = 0; round < kRounds; ++round) {
-      Delivery delivery;
-      const int frame = static_cast<int>(random() % 22);
-      HX_Guid identifier;
-      const bool cancels = random() % 3 == 0;
-      {
-        const Node node = InputNode();
-        identifier = GuidAt(node, frame * kFrame);
-        cache.Reference(&identifier);
-        EXPECT_EQ(Ask(node, frame * kFrame, delivery), HX_ERR_NONE);
-        if (cancels) renders.Cancel(delivery.id);
-      }
-      delivery.arrived.Wait();
-      EXPECT_TRUE(cancels || (delivery.frame != 0) == (frame < 20));
-      if (delivery.frame != 0) {
-        frames.Dispose(delivery.frame);
-        HX_Frame cached = 0;
-        cache.Lookup(&identifier, &cached);
-        EXPECT_EQ(Sample(cached, 2, 1), RedAndGreen(12, frame));
-        ++read;
-      }
-      cache.Dereference(&identifier);
-    }
-  };
-  std::vector<std::jthread> jobs;
-  for (unsigned job = 0; job < kJobs; ++job) jobs.emplace_back(work, job);
-  for (int i = 0; i < 200; ++i) {
-    layer->SetParameters(kOwnId, std::to_string(i));
-    if (i % 20 == 0) layer->InsertEffect(0, {50, "Upstream", std::to_string(i), {}});
-    const PicturePtr input = Input(i % 20);
-    ASSERT_TRUE(input);
-    EXPECT_EQ(input->row<HX_Pixel8>(0)[0].green, i % 20);
-    if (i % 20 == 19) layer->RemoveEffect(50);
-  }
-  jobs.clear();
-  EXPECT_GT(read, kJobs * kRounds / 3);
 }
 
 }  // namespace
