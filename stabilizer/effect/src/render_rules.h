@@ -9,6 +9,7 @@
 // How parameters become the settings of a render.
 namespace kelp::effect {
 
+using marrow::render::DeblurDebug;
 using marrow::render::RenderSettings;
 
 // How the parameters ask for frames to be drawn; the synthesis range is MarginInFrames's to tell.
