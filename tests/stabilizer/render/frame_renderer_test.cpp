@@ -218,6 +218,12 @@ TYPED_TEST(FrameRenderer, FramingsZoomsAndScales) {
   }
   // The plane's width limits pixels far from its origin.
   ExpectAsPlain<TypeParam>({.to = Moved(20, 9), .settings = {}});
+  // The border's two pixels beside slanting edges.
+  RenderSettings doubled{.framing = Framing::stabilize_only, .additional_scale = 2};
+  const auto slanting = [](double x, double y) {
+    return point2{.7 * x - .5 * y + 30, .5 * x + .7 * y};
+  };
+  ExpectAsPlain<TypeParam>({.to = slanting, .settings = doubled});
 }
 
 TYPED_TEST(FrameRenderer, WideCellsAndOddSizes) {
