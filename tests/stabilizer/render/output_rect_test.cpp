@@ -31,16 +31,16 @@ TEST(IsOvercropped, UnderTwoFifthsAsShown) {
 
 TEST(SetupOutputRect, TheWholePlaneWithoutACrop) {
   const SolvedClip clip(100, 80, 3, 3, [](double x, double y) {
-    return point2{x * 1.1 - 8, y - 3.5};
+    return point2{x * 1.1 - 8, y * 1.1 - 3.5};
   });
   const Renderer renderer = makeRenderer(clip, 1, 1);
   const auto numbers = [&](Framing framing) {
     const OutputRect rect = setupOutputRect(framing, renderer, 100, 80);
     return std::vector<int>{rect.width, rect.height, rect.origin_x, rect.origin_y};
   };
-  // 99 * 1.1 = 108.9; half of the difference, truncated.
-  EXPECT_THAT(numbers(Framing::stabilize_only), ElementsAre(109, 79, 4, 0));
-  EXPECT_THAT(numbers(Framing::synthesize_edges), ElementsAre(109, 79, 4, 0));
+  // 99 * 1.1 = 108.9 and 79 * 1.1 = 86.9; half of the difference, truncated.
+  EXPECT_THAT(numbers(Framing::stabilize_only), ElementsAre(109, 87, 4, 3));
+  EXPECT_THAT(numbers(Framing::synthesize_edges), ElementsAre(109, 87, 4, 3));
   EXPECT_THAT(numbers(Framing::crop), ElementsAre(100, 80, 0, 0));
 }
 
