@@ -66,9 +66,9 @@ TEST(PreparedSources, EachFrameIsPreparedOnceThoughTwoAreHeld) {
   frames.refused = 13;
   PreparedSources<HX_Pixel8> prepared(frames, {1, 0, 0, 0, 0}, 5);
   // The frame, twice a neighbour that some pass wants beforehand, then all in their order.
-  const auto kept = prepared.Fetch(9);
+  const auto kept = prepared.fetch(9);
   for (const std::size_t frame : {5, 9, 9, 6, 4, 7, 3, 8, 2, 9}) {
-    const auto world = prepared.Fetch(frame);
+    const auto world = prepared.fetch(frame);
     EXPECT_EQ(world->row(1)[1].red, frame);
     EXPECT_EQ(world->row(1)[0].alpha, 0);
     EXPECT_EQ(world->row(1)[1].alpha, 255);
@@ -76,11 +76,11 @@ TEST(PreparedSources, EachFrameIsPreparedOnceThoughTwoAreHeld) {
   EXPECT_EQ(frames.TakeAsked(), (std::vector<std::size_t>{9, 5, 6, 4, 7, 3, 8, 2}));
   EXPECT_EQ(kept->row(0)[1].red, 9);
   // What somebody still holds is not written over.
-  const auto two = prepared.Fetch(2);
-  prepared.Fetch(1);
+  const auto two = prepared.fetch(2);
+  prepared.fetch(1);
   EXPECT_EQ(two->row(1)[1].red, 2);
-  EXPECT_THROW(prepared.Fetch(13), std::int32_t);
-  EXPECT_EQ(prepared.Fetch(1)->row(1)[1].red, 1);
+  EXPECT_THROW(prepared.fetch(13), std::int32_t);
+  EXPECT_EQ(prepared.fetch(1)->row(1)[1].red, 1);
 }
 
 }  // namespace

@@ -112,7 +112,7 @@ class Pictures final : public SourceFrames<Pixel> {
     Add(boost::make_shared<WorldX<Pixel>>(width, height));
     std::fill_n(worlds.back()->data(), width * height, colour);
   }
-  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) override {
+  boost::shared_ptr<const WorldX<Pixel>> fetch(std::size_t frame) override {
     asked.push_back(frame);
     if (frame == refused) throw std::int32_t{42};
     return worlds.at(frame);
