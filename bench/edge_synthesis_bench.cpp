@@ -89,7 +89,7 @@ class Frames final : public SourceFrames<Pixel> {
       }
     }
   }
-  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) override {
+  boost::shared_ptr<const WorldX<Pixel>> fetch(std::size_t frame) override {
     return worlds_[frame % std::size(worlds_)];
   }
 
@@ -140,7 +140,7 @@ void SynthesisBesideRenders(benchmark::State& state) {
     renderFrame<Pixel>(shot, nullptr, alone, renderer, kRange, frames, operations, out);
     const double end = Now();
     for (int i = 0; i < 2 * kRange + 1; ++i) {
-      prepareEdges(*frames.Fetch(i), scaledEdges(filled.edges, 1), prepared);
+      prepareEdges(*frames.fetch(i), scaledEdges(filled.edges, 1), prepared);
     }
     preparing += Now() - end;
     synthesis.push_back(middle - begin);

@@ -106,7 +106,7 @@ class Frame final : public SourceFrames<Pixel> {
     }
     noise.convertTo(image(), depth<Pixel>::type, depth<Pixel>::full);
   }
-  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t) override { return world_; }
+  boost::shared_ptr<const WorldX<Pixel>> fetch(std::size_t) override { return world_; }
   cv::Mat image() {
     return cv::Mat(world_->height(), world_->width(), depth<Pixel>::type, world_->data());
   }

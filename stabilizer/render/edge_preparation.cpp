@@ -86,11 +86,11 @@ void prepareEdges(const WorldX<Pixel>& from, const EdgePreparation& edges, World
 }
 
 template <class Pixel>
-boost::shared_ptr<const WorldX<Pixel>> PreparedSources<Pixel>::Fetch(std::size_t frame) {
+boost::shared_ptr<const WorldX<Pixel>> PreparedSources<Pixel>::fetch(std::size_t frame) {
   for (const prepared* held : {&first_neighbour_, &latest_}) {
     if (held->world && held->frame == frame) return held->world;
   }
-  const boost::shared_ptr<const WorldX<Pixel>> source = sources_.Fetch(frame);
+  const boost::shared_ptr<const WorldX<Pixel>> source = sources_.fetch(frame);
   prepared& place = frame != frame_ && !first_neighbour_.world ? first_neighbour_ : latest_;
   boost::shared_ptr<WorldX<Pixel>> world = std::move(place.world);
   place.world.reset();

@@ -49,7 +49,7 @@ class PreparedSources final : public SourceFrames<Pixel> {
   PreparedSources(SourceFrames<Pixel>& sources, const EdgePreparation& edges, std::size_t frame)
       : sources_(sources), edges_(edges), frame_(frame) {}
 
-  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) override;
+  boost::shared_ptr<const WorldX<Pixel>> fetch(std::size_t frame) override;
 
  private:
   struct prepared {

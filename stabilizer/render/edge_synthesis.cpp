@@ -84,7 +84,7 @@ void synthesizeEdges(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
     if (parts.empty()) continue;
 
     const boost::shared_ptr<const WorldX<Pixel>> source =
-        pass.sources.Fetch(static_cast<std::size_t>(M));
+        pass.sources.fetch(static_cast<std::size_t>(M));
     if (!layer) layer.emplace(output.width(), output.height());
     for (const pixel_rect& part : parts) partOf(*layer, part).clear();
     drawMesh(*mesh, *source, *layer, &shown);

@@ -44,7 +44,7 @@ template <class Pixel>
 bool drawFrame(const FramePass<Pixel>& pass, std::size_t M, WorldX<Pixel>& output, bool clears) {
   const std::optional<FrameMesh> mesh = meshOfFrame(pass, M, output.width(), output.height());
   if (!mesh) return false;
-  drawMesh(*mesh, *pass.sources.Fetch(M), output, nullptr, clears);
+  drawMesh(*mesh, *pass.sources.fetch(M), output, nullptr, clears);
   return true;
 }
 

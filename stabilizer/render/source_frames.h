@@ -13,7 +13,7 @@ template <class Pixel>
 class SourceFrames {
  public:
   virtual ~SourceFrames() = default;
-  virtual boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) = 0;
+  virtual boost::shared_ptr<const WorldX<Pixel>> fetch(std::size_t frame) = 0;
 };
 
 }  // namespace marrow::render

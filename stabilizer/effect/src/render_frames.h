@@ -97,7 +97,7 @@ class ClipFrames final : public SourceFrames<Pixel> {
   ClipFrames(RenderFrames& frames, std::int64_t first_frame)
       : frames_(frames), first_frame_(first_frame) {}
 
-  boost::shared_ptr<const WorldX<Pixel>> Fetch(std::size_t frame) override {
+  boost::shared_ptr<const WorldX<Pixel>> fetch(std::size_t frame) override {
     struct Held {
       boost::shared_ptr<HX_World> world;
       WorldX<Pixel> pixels;

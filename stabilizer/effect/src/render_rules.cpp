@@ -7,7 +7,6 @@
 
 namespace kelp::effect {
 
-using marrow::render::DeblurDebug;
 using marrow::render::DeblurSettings;
 
 namespace {

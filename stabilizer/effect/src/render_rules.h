@@ -8,6 +8,7 @@
 // How parameters become the settings of a render.
 namespace kelp::effect {
 
+using marrow::render::DeblurDebug;
 using marrow::render::Framing;
 using marrow::render::RenderSettings;
 
