@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "tests/contract/held_work.h"
+#include "tests/support/held_work.h"
 #include "tests/contract/played_plugin.h"
 
 // What frames say about their status, by the banner that a user sees.

@@ -3,7 +3,7 @@
 #include <string>
 #include <vector>
 
-#include "tests/contract/held_work.h"
+#include "tests/support/held_work.h"
 #include "tests/contract/played_plugin.h"
 
 // What a user does in the middle of everything: the same at each of these places of an effect's

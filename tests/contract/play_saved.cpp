@@ -9,7 +9,7 @@
 #include "host/base/operations.h"
 #include "host/effects/session.h"
 #include "tests/contract/saved_file.h"
-#include "tests/contract/shaky_clip.h"
+#include "tests/support/shaky_clip.h"
 
 int main(int argc, char** argv) {
   using namespace calmframe::host;

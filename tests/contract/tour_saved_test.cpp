@@ -5,7 +5,7 @@
 #include <filesystem>
 #include <string>
 
-#include "tests/contract/held_work.h"
+#include "tests/support/held_work.h"
 #include "tests/contract/played_plugin.h"
 #include "tests/contract/saved_file.h"
 

@@ -4,7 +4,7 @@
 #include <vector>
 
 #include "platform/tessel/debug.h"
-#include "tests/contract/held_work.h"
+#include "tests/support/held_work.h"
 #include "tests/contract/played_plugin.h"
 
 // The real plug-in, played by the host as any plug-in is.

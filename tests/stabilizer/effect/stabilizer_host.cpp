@@ -68,35 +68,6 @@ HX_Err Entry(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef*
   return EffectMain<StabilizerEffect>(command, in, out, params, output, extra);
 }
 
-boost::shared_ptr<const CPWarper> ShiftingWarper(
-    int width, int height, const std::vector<marrow::stabilization::point2>& shifts,
-    std::int32_t map_radius) {
-  const auto warper =
-      boost::make_shared<CPWarper>(static_cast<std::int32_t>(shifts.size()), width, height);
-  for (const auto& shift : shifts) {
-    const auto record = boost::make_shared<marrow::stabilization::VarVector>(warper->gridCols(),
-                                                                             warper->gridRows());
-    for (std::size_t i = 0; i < record->values.size(); i += 2) {
-      const auto vertex = static_cast<std::int32_t>(i / 2);
-      record->values[i] = (vertex % record->cols) * warper->cellWidth() + shift.x;
-      record->values[i + 1] = (vertex / record->cols) * warper->cellHeight() + shift.y;
-    }
-    warper->storeFrameWarp(record, false);
-  }
-  marrow::stabilization::MtoNMap::entries_t entries;
-  const auto count = static_cast<std::int32_t>(shifts.size());
-  for (std::int32_t M = 0; M < count; ++M) {
-    for (std::int32_t N = std::max(M - map_radius, 0); N <= std::min(M + map_radius, count - 1);
-         ++N) {
-      const auto& shift = shifts[static_cast<std::size_t>(M)];
-      if (M != N) entries[{M, N}] = {1, 0, shift.x, 0, 1, shift.y, 0, 0, 1};
-    }
-  }
-  warper->setFrameMap(
-      boost::make_shared<marrow::stabilization::MtoNMap>(count, map_radius, std::move(entries)));
-  return warper;
-}
-
 TestWorld::TestWorld(int width, int height, std::int32_t depth, int origin_x, int origin_y) {
   world_.format = depth == 32 ? HX_FORMAT_ARGBF : depth == 16 ? HX_FORMAT_ARGB16 : HX_FORMAT_ARGB8;
   world_.flags = depth == 16 ? HX_WORLD_DEEP : 0;

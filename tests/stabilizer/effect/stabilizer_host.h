@@ -13,17 +13,12 @@
 #include "tests/analysis/src/fake_host.h"
 #include "tests/effect/fake_host.h"
 #include "tests/support/shaken_table.h"
+#include "tests/support/shifting_warper.h"
 
 namespace kelp::effect {
 
 HX_Err Entry(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef* params[],
              HX_World* output, void* extra);
-
-// One record a frame that moves the rest grid; solved, as far as anybody can tell.
-// With a map of that radius, each frame lies by its own shift in every other's output too.
-boost::shared_ptr<const marrow::stabilization::CPWarper> ShiftingWarper(
-    int width, int height, const std::vector<marrow::stabilization::point2>& shifts,
-    std::int32_t map_radius = 0);
 
 // A frame buffer of memory of its own.
 class TestWorld {

@@ -5,7 +5,7 @@
 #include <boost/make_shared.hpp>
 
 #include "stabilizer/effect/src/table_reader.h"
-#include "tests/stabilizer/effect/stabilizer_host.h"
+#include "tests/support/shifting_warper.h"
 
 namespace kelp::effect {
 namespace {
