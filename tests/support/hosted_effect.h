@@ -36,7 +36,7 @@ enum class Path { planned, direct };
 
 // A clip that is quickly analysed.
 inline ShakyClip SmallClip(const std::string& name = "small clip", std::int64_t frames = 8) {
-  return {96, 64, frames, name};
+  return {96, 64, frames, name, 0.3};
 }
 
 // The plug-in's effect, linked into the test program, on a layer of the real host. It knows no more

@@ -3,19 +3,16 @@
 #include <boost/make_shared.hpp>
 #include <cmath>
 
-#include "analysis/effect/analysis_parameter_rows.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "synthetic/track_world.h"
-#include "tests/stabilizer/effect/stabilizer_host.h"
+#include "tests/support/hosted_effect.h"
 
-namespace kelp::effect {
+namespace calmframe::host {
 namespace {
 
-using analysis::FrameStatus;
-using analysis::effect::DeletedTrackPoints;
+using kelp::effect::StabilizerEffect;
 using marrow::stabilization::CPWarper;
 using marrow::tracking::AllFeatures;
-using marrow::tracking::TrackPoints;
 
 constexpr std::int32_t kFrames = 60, kBackground = 40, kForeground = 120;
 
@@ -74,10 +71,12 @@ struct World {
     return std::sqrt(sum / ((kFrames - 2) * kBackground));
   }
 
-  // A point somewhere on each track of the walker.
-  static DeletedTrackPoints Walker() {
-    DeletedTrackPoints points;
-    for (std::int32_t s = 0; s < kForeground; ++s) points.Add({s % kFrames, kBackground + s});
+  // A point somewhere on each track of the walker: the frame above the slot.
+  static std::vector<std::uint64_t> Walker() {
+    std::vector<std::uint64_t> points;
+    for (std::uint64_t s = 0; s < kForeground; ++s) {
+      points.push_back(s % kFrames << 32 | (kBackground + s));
+    }
     return points;
   }
 
@@ -85,197 +84,200 @@ struct World {
   AllFeatures table;
 };
 
-std::vector<double> WarpsOf(const CPWarper& warper) {
-  std::vector<double> all;
-  for (std::size_t f = 0; f < warper.frameWarpCount(); ++f) {
-    const auto& values = warper.frameWarp(f)->values;
-    all.insert(all.end(), values.begin(), values.end());
-  }
-  return all;
-}
-
+// In a host that keeps the parameter, with the world's tracks as those of a blank clip.
 class DeletionsTest : public ::testing::Test {
  protected:
-  DeletionsTest() : test(kFrames) {}
-  void SetUpSolved() {
-    test.SetDeletions({});
-    test.Analysed(world.table);
-    test.TickUntilSolved();
-    ASSERT_EQ(test.Status(), 8);
+  static SourcePtr BlankClip() {
+    SourceInfo info;
+    info.width = 640;
+    info.height = 360;
+    info.frame_count = kFrames;
+    info.content = tessel::utility::Guid::FromText("blank");
+    return MakeDrawnSource(info, [](std::int64_t, Picture&) {});
+  }
+  void SetUp() override {
+    ASSERT_EQ(hosted.Analyse(), 8);
+    hosted.Inside([this](StabilizerEffect& effect) {
+      effect.GetState()->all_features = world.table;
+      effect.GetState()->MakeResultIdentityUnique();
+      effect.MarkNeedsSolve();
+    });
+    ASSERT_EQ(hosted.Settle(), 8);
+    hosted.stages().Take();
+  }
+  boost::shared_ptr<const CPWarper> Warper() {
+    boost::shared_ptr<const CPWarper> warper;
+    hosted.Inside([&](StabilizerEffect& effect) { warper = effect.GetState()->warper; });
+    return warper;
+  }
+  double Jitter() { return world.Jitter(*Warper()); }
+  std::vector<double> Warps() {
+    std::vector<double> all;
+    for (std::int32_t f = 0; f < kFrames; ++f) {
+      const std::vector<double> warp = hosted.Warp(f);
+      all.insert(all.end(), warp.begin(), warp.end());
+    }
+    return all;
+  }
+  // Of the walker's first track in the first frame.
+  std::int32_t MarkOf(std::int32_t slot) {
+    std::int32_t status = 0;
+    hosted.Inside([&](StabilizerEffect& effect) {
+      status = (*effect.GetState()->all_features.features)[slot].status;
+    });
+    return status;
   }
 
   const World world;
-  StabilizerHost test;
+  HostedEffect hosted{BlankClip(), {.keeps_deletions = true}};
 };
 
 TEST_F(DeletionsTest, WithoutAMovingObjectsTracksTheBackgroundIsSteadierAndUndoIsExact) {
-  SetUpSolved();
-  StabilizerState& state = *test.state();
-  const std::vector<double> first = WarpsOf(*state.warper);
-  const double before = world.Jitter(*state.warper);
-
-  test.SetDeletions(World::Walker());
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  ASSERT_TRUE(state.solver);
-  EXPECT_EQ(test.Status(), 7);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), FrameStatus::SubsequentSolveOnDeletion);
-  test.TickUntilSolved();
-  EXPECT_EQ(test.Status(), 8);
-  const double after = world.Jitter(*state.warper);
+  const std::vector<double> first = Warps();
+  const double before = Jitter();
+  hosted.SetDeletions(World::Walker());
+  EXPECT_TRUE(hosted.Tick().ok());
+  EXPECT_EQ(hosted.Status(), 7);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
+  const double after = Jitter();
   RecordProperty("jitter_before", std::to_string(before));
   RecordProperty("jitter_after", std::to_string(after));
   EXPECT_LT(after, 0.2 * before) << before << " to " << after;
-  EXPECT_EQ((*state.all_features.features)[kBackground].status, -10);
+  EXPECT_EQ(MarkOf(kBackground), -10);
   EXPECT_EQ((*world.table.features)[kBackground].status, 1) << "the analysis' own cells";
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_FALSE(state.needs_solve) << "once is enough";
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "") << "once is enough";
 
-  test.SetDeletions({});
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_EQ(test.Status(), 7);
-  test.TickUntilSolved();
-  EXPECT_EQ(WarpsOf(*state.warper), first);
+  hosted.SetDeletions({});
+  EXPECT_TRUE(hosted.Tick().ok());
+  EXPECT_EQ(hosted.Status(), 7);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(Warps(), first);
 }
 
 TEST_F(DeletionsTest, WhileItIsSolvedFramesShowTheInputUnderAFaintBanner) {
-  SetUpSolved();
-  test.SetDeletions(World::Walker());
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  test.RenderCopy();
-  TestWorld source(640, 360, 8), output(640, 360, 8);
-  for (int y = 0; y < 360; ++y) {
-    for (int x = 0; x < 640; ++x) source.Set(x, y, 0.5, 0.5);
+  hosted.HoldSolve();
+  hosted.SetDeletions(World::Walker());
+  hosted.TickUntilHeld();
+  const RenderedFrame frame = hosted.Render(0);
+  ASSERT_TRUE(frame.pixels);
+  // Over black, stripes of (0.8, 0.333, 0) and four fifths of that, a fifth opaque.
+  double darkest = 1, brightest = 0;
+  for (int x = 1; x < 100; x += 3) {  // left of the text
+    const double red = ChannelAt(*frame.pixels, x, 156, 1);
+    darkest = std::min(darkest, red);
+    brightest = std::max(brightest, red);
+    EXPECT_NEAR(ChannelAt(*frame.pixels, x, 156, 2), red / 2.4, 0.01);
+    EXPECT_EQ(ChannelAt(*frame.pixels, x, 20, 1), 0);
   }
-  test.host.params[0].u.ld = *source.get();
-  ASSERT_EQ(test.Call(HX_CMD_PREPARE_FRAME), HX_ERR_NONE);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), FrameStatus::SubsequentSolveOnDeletion);
-  ASSERT_EQ(test.Call(HX_CMD_RENDER_FRAME, output.get()), HX_ERR_NONE);
-  // Stripes of (0.8, 0.333, 0) and four fifths of that, a fifth opaque.
-  for (const int x : {1, 60, 630}) {
-    EXPECT_NEAR(output.At(x, 156, 1), 0.544, 0.02);
-    EXPECT_NEAR(output.At(x, 156, 2), 0.46, 0.012);
-    EXPECT_NEAR(output.At(x, 156, 3), 0.2, 0.004);
-    EXPECT_NEAR(output.At(x, 20, 1), 0.5, 0.003);
-  }
+  EXPECT_NEAR(brightest, 0.8, 0.02) << "its colour, where nothing is beneath";
+  EXPECT_NEAR(darkest, 0.64, 0.02);
 }
 
 TEST_F(DeletionsTest, UnknownPointsChangeNothingButAreSolvedOnce) {
-  SetUpSolved();
-  StabilizerState& state = *test.state();
-  const std::vector<double> first = WarpsOf(*state.warper);
-  const auto cells = state.all_features.features;
-  test.SetDeletions(DeletedTrackPoints(TrackPoints{{kFrames, 0}, {0, 9999}}));
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_EQ(test.Status(), 7);
-  EXPECT_FALSE(state.solver->warper_supplied()) << "a solve of its own";
-  test.TickUntilSolved();
-  EXPECT_EQ(WarpsOf(*state.warper), first);
-  EXPECT_EQ(state.all_features.features, cells);
+  const std::vector<double> first = Warps();
+  hosted.SetDeletions({std::uint64_t{kFrames} << 32, 9999});
+  EXPECT_TRUE(hosted.Tick().ok());
+  EXPECT_EQ(hosted.Status(), 7);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "factorization crop ") << "a solve of its own";
+  EXPECT_EQ(Warps(), first);
+  EXPECT_EQ(MarkOf(kBackground), 1);
 }
 
 TEST_F(DeletionsTest, AChangeDuringASolveStartsAnotherAndASetBackKeepsTheWarps) {
-  SetUpSolved();
-  StabilizerState& state = *test.state();
-  const auto warper = state.warper;
-  test.SetDeletions(World::Walker());
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  const Solver* const first = state.solver.get();
-  while (first->GetState() == Solver::not_started) std::this_thread::yield();
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  if (state.solver) {
-    EXPECT_EQ(state.solver.get(), first) << "the same set";
+  const std::vector<double> first = Warps();
+  hosted.HoldSolve();
+  hosted.SetDeletions(World::Walker());
+  hosted.TickUntilHeld();
+  hosted.SetDeletions({});
+  {
+    const std::jthread release = hosted.ReleaseSoon();
+    EXPECT_TRUE(hosted.Tick().ok());
   }
-  test.SetDeletions({});
-  test.TickUntilSolved();
-  EXPECT_EQ(WarpsOf(*state.warper), WarpsOf(*warper));
-  EXPECT_EQ((*state.all_features.features)[kBackground].status, 1);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(Warps(), first);
+  EXPECT_EQ(MarkOf(kBackground), 1);
 }
 
 TEST_F(DeletionsTest, WithoutAnyTrackTheClipRestsUntilTheyComeBack) {
-  SetUpSolved();
-  StabilizerState& state = *test.state();
-  const std::vector<double> first = WarpsOf(*state.warper);
-  DeletedTrackPoints all = World::Walker();
-  for (std::int32_t s = 0; s < kBackground; ++s) all.Add({0, s});
-  test.SetDeletions(all);
-  test.TickUntilSolved();
-  EXPECT_EQ(test.Status(), 8);
-  EXPECT_NE(WarpsOf(*state.warper), first);
-  for (int i = 0; i < 3; ++i) ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_FALSE(state.solver) << "once is enough";
-  test.SetDeletions({});
-  test.TickUntilSolved();
-  EXPECT_EQ(test.Status(), 8);
-  EXPECT_EQ(WarpsOf(*state.warper), first);
+  const std::vector<double> first = Warps();
+  std::vector<std::uint64_t> all = World::Walker();
+  for (std::uint64_t s = 0; s < kBackground; ++s) all.push_back(s);
+  hosted.SetDeletions(all);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_NE(Warps(), first);
+  hosted.stages().Take();
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "") << "once is enough";
+  hosted.SetDeletions({});
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(Warps(), first);
 }
 
 TEST_F(DeletionsTest, AProjectKnowsWhatItsSolveLeftOut) {
-  SetUpSolved();
-  test.SetDeletions(World::Walker());
-  test.TickUntilSolved();
-  ASSERT_EQ(test.Call(HX_CMD_FLATTEN_INSTANCE), HX_ERR_NONE);
-  ASSERT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
-  const std::vector<double> loaded = WarpsOf(*test.state()->warper);
-  for (int i = 0; i < 2; ++i) ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_FALSE(test.state()->solver);
-  EXPECT_FALSE(test.state()->needs_solve);
-  test.SetDeletions({});
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_EQ(test.Status(), 7);
-  test.TickUntilSolved();
-  EXPECT_NE(WarpsOf(*test.state()->warper), loaded);
-  EXPECT_EQ((*test.state()->all_features.features)[kBackground].status, 1);
+  hosted.SetDeletions(World::Walker());
+  EXPECT_EQ(hosted.Settle(), 8);
+  hosted.stages().Take();
+  hosted.Save();  // and loaded where it stands
+  const std::vector<double> loaded = Warps();
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "");
+  hosted.SetDeletions({});
+  EXPECT_TRUE(hosted.Tick().ok());
+  EXPECT_EQ(hosted.Status(), 7);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_NE(Warps(), loaded);
+  EXPECT_EQ(MarkOf(kBackground), 1);
 }
 
 TEST_F(DeletionsTest, AProjectSavedDuringTheSolveSolvesItAgain) {
-  SetUpSolved();
-  const double before = world.Jitter(*test.state()->warper);
-  test.SetDeletions(World::Walker());
-  ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-  ASSERT_EQ(test.Call(HX_CMD_FLATTEN_INSTANCE), HX_ERR_NONE);
-  ASSERT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
-  test.TickUntilSolved();
-  EXPECT_LT(world.Jitter(*test.state()->warper), 0.2 * before);
+  const double before = Jitter();
+  hosted.HoldSolve();
+  hosted.SetDeletions(World::Walker());
+  hosted.TickUntilHeld();
+  {
+    const std::jthread release = hosted.ReleaseSoon();
+    hosted.Save();
+  }
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_LT(Jitter(), 0.2 * before);
 }
 
 TEST_F(DeletionsTest, AnalyzeForgetsThem) {
-  SetUpSolved();
-  test.SetDeletions(World::Walker());
-  test.TickUntilSolved();
-  HX_ParamChangedExtra pressed{test.Effect().ParamIdToIndex(analysis::effect::kAnalyzeParam)};
-  ASSERT_EQ(test.Call(HX_CMD_PARAM_CHANGED, nullptr, &pressed), HX_ERR_NONE);
-  EXPECT_TRUE(test.Deletions().empty());
-  EXPECT_EQ(test.deletions_param().change_flag, 1);
-  EXPECT_EQ(test.host.replaced_values.size(), 1u);
-  test.deletions_param().change_flag = 0;
-  ASSERT_EQ(test.Call(HX_CMD_PARAM_CHANGED, nullptr, &pressed), HX_ERR_NONE);
-  EXPECT_EQ(test.deletions_param().change_flag, 0) << "empty already";
+  hosted.SetDeletions({7});
+  EXPECT_EQ(hosted.Settle(), 8);
+  hosted.Set(kDetailedAnalysis, 1);
+  EXPECT_TRUE(hosted.Deletions().empty());
+  const auto value = [this] {
+    return hosted.effect().Param(hosted.deletions_index())->u.arb_d.value;
+  };
+  const HX_Handle empty = value();
+  hosted.Set(kDetailedAnalysis, 0);
+  EXPECT_EQ(value(), empty) << "empty already";
 }
 
 // Whatever call fails on the way, nothing is left behind and the deletion is solved in the end.
 TEST_F(DeletionsTest, AFailingCallAnywhereOnTheWay) {
-  const AllFeatures table = ShakenTable(8, 20);
-  test.SetDeletions({});
-  StabilizerState& state = test.Analysed(table);
-  test.TickUntilSolved();
-  for (int n = 1; n < 400; ++n) {
-    test.SetDeletions(n % 2 ? DeletedTrackPoints(TrackPoints{{3, 5}}) : DeletedTrackPoints());
-    test.host.ForgetOperations();
-    test.host.FailOperation(n);
-    for (int tick = 0; tick < 3; ++tick) {
-      test.Tick();
-      if (state.solver) state.solver->Wait();
-    }
-    const bool all = test.host.operations().size() < static_cast<std::size_t>(n);
-    test.host.FailOperation(0);
-    ASSERT_EQ(test.Tick(), HX_ERR_NONE);
-    test.TickUntilSolved();
-    EXPECT_EQ((*state.all_features.features)[5].status, n % 2 ? -10 : 1) << n;
-    EXPECT_EQ(test.Status(), 8) << n;
-    if (all) return;
+  const auto names = HostedEffect::OperationsOf([this] {
+    hosted.SetDeletions({5});
+    hosted.Settle();
+  });
+  EXPECT_GT(names.size(), 50u);
+  const std::set<std::string> different(names.begin(), names.end());
+  std::uint64_t point = 6;
+  for (const std::string& name : different) {
+    hosted.SetDeletions({point});
+    Operations::Get().FailNth(1, name);
+    for (int tick = 0; tick < 3; ++tick) hosted.Tick();
+    Operations::Get().FailNone();
+    EXPECT_EQ(hosted.Settle(), 8) << name;
+    EXPECT_EQ(MarkOf(static_cast<std::int32_t>(point)), -10) << name;
+    EXPECT_NE(MarkOf(static_cast<std::int32_t>(point) - 1), -10) << name;
+    ++point;
   }
-  FAIL() << "no end of host calls";
 }
 
 }  // namespace
-}  // namespace kelp::effect
+}  // namespace calmframe::host
