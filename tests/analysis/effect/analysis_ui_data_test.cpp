@@ -6,7 +6,6 @@
 #include <limits>
 
 #include "analysis/effect/track_colors.h"
-#include "host/pixels/world_operations.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "tests/support/hosted_effect.h"
 
@@ -26,6 +25,10 @@ constexpr float kNaN = std::numeric_limits<float>::quiet_NaN();
 // Two analysed frames, 10 and 11 of the clip, in 160 x 120.
 class AnalysisUIDataTest : public ::testing::Test {
  protected:
+  // Of floats, clear at first.
+  struct Picture : WorldBuffer {
+    Picture(int width, int height) : WorldBuffer(width, height, HX_FORMAT_ARGBF) {}
+  };
   using Cells = std::vector<marrow::tracking::tracking_feature<float>>;
   using Look = std::function<void(StabilizerEffect& effect, HX_InData& in)>;
 
@@ -60,16 +63,11 @@ class AnalysisUIDataTest : public ::testing::Test {
               look);
   }
 
-  // Opaque black.
-  static std::unique_ptr<WorldBuffer> Picture(int width, int height,
-                                              std::uint32_t format = HX_FORMAT_ARGBF) {
-    auto picture = std::make_unique<WorldBuffer>(width, height, format);
-    WorldBuffer black(width, height, HX_FORMAT_ARGBF);
-    for (int y = 0; y < height; ++y) {
-      for (int x = 0; x < width; ++x) black.row<float>(y)[4 * x] = 1;
-    }
-    calmframe::host::CopyWorld(black.world(), picture->world(), nullptr, nullptr);
-    return picture;
+  // What was drawn over nothing, at a pixel: a channel of its own colours, none outside.
+  static double Drawn(const WorldBuffer& picture, int x, int y, int channel) {
+    const HX_Rect all = picture.rect();
+    if (x < all.left || y < all.top || x >= all.right || y >= all.bottom) return 0;
+    return ChannelAt(picture, x, y, channel) * ChannelAt(picture, x, y, 0);
   }
   // The middle of what was drawn within `reach` of a place, in pixels whose centres are whole
   // numbers; every channel counts.
@@ -78,12 +76,12 @@ class AnalysisUIDataTest : public ::testing::Test {
     double sum = 0, sum_x = 0, sum_y = 0;
     for (int v = int(y) - reach; v <= int(y) + reach + 1; ++v) {
       for (int u = int(x) - reach; u <= int(x) + reach + 1; ++u) {
-        if (u < 0 || v < 0 || u >= picture.world().width || v >= picture.world().height) continue;
-        const double drawn =
-            ChannelAt(picture, u, v, 1) + ChannelAt(picture, u, v, 2) + ChannelAt(picture, u, v, 3);
-        sum += drawn;
-        sum_x += drawn * u;
-        sum_y += drawn * v;
+        for (const int channel : {1, 2, 3}) {
+          const double drawn = Drawn(picture, u, v, channel);
+          sum += drawn;
+          sum_x += drawn * u;
+          sum_y += drawn * v;
+        }
       }
     }
     EXPECT_GT(sum, 0) << x << " " << y;
@@ -124,9 +122,9 @@ TEST_F(AnalysisUIDataTest, PointsAreTheLiveCellsOfTheFrame) {
     hosted_.Place(start, 1);
     WithPoints([this](StabilizerEffect& effect, HX_InData&) {
       EXPECT_EQ(AnalysisUIData(effect).frame(), -1);
-      const auto picture = Picture(160, 120);
-      Draw(effect, *picture);
-      EXPECT_EQ(ChannelAt(*picture, 20, 15, 1), 0);
+      Picture picture(160, 120);
+      Draw(effect, picture);
+      EXPECT_EQ(Drawn(picture, 20, 15, 0), 0);
       EXPECT_EQ(windows().invalidations(), 0u);
     });
   }
@@ -143,25 +141,25 @@ TEST_F(AnalysisUIDataTest, DotsLieOnTheirFeaturesAtEveryScaleAndAspect) {
       in.pixel_aspect = {aspect, 1};
       for (const std::uint32_t half : {1u, 2u}) {
         in.downsample_x = in.downsample_y = {1, half};
-        const auto whole = Picture(160 / half, 120 / half);
-        Draw(effect, *whole);
+        Picture whole(160 / half, 120 / half);
+        Draw(effect, whole);
         // A pixel of the half picture covers two: its centre n is at 2 n + 1/2.
         const auto scaled = [&](double at) { return (at + 0.5) / half - 0.5; };
         for (const auto& [x, y] : {std::pair{20.25, 15.5}, {100.0, 80.0}}) {
           const auto [found_x, found_y] =
-              MiddleAround(*whole, scaled(x), scaled(y), half == 1 ? 7 : 3);
+              MiddleAround(whole, scaled(x), scaled(y), half == 1 ? 7 : 3);
           EXPECT_NEAR(found_x, scaled(x), 0.05) << half;
           EXPECT_NEAR(found_y, scaled(y), 0.05) << half;
         }
         // A part of a larger output, from (10, 6) on.
-        const auto part = Picture(30, 20);
-        part->world().origin_x = 10;
-        part->world().origin_y = 6;
-        Draw(effect, *part);
+        Picture part(30, 20);
+        part.world().origin_x = 10;
+        part.world().origin_y = 6;
+        Draw(effect, part);
         for (int y = 6; y < 26; ++y) {
           for (int x = 10; x < 40; ++x) {
-            ASSERT_EQ(ChannelAt(*part, x, y, 1), ChannelAt(*whole, x, y, 1)) << x << " " << y;
-            ASSERT_EQ(ChannelAt(*part, x, y, 2), ChannelAt(*whole, x, y, 2));
+            ASSERT_EQ(ChannelAt(part, x, y, 1), ChannelAt(whole, x, y, 1)) << x << " " << y;
+            ASSERT_EQ(ChannelAt(part, x, y, 2), ChannelAt(whole, x, y, 2));
           }
         }
       }
@@ -172,26 +170,26 @@ TEST_F(AnalysisUIDataTest, DotsLieOnTheirFeaturesAtEveryScaleAndAspect) {
 // That depths show the same is asked of whole renders.
 TEST_F(AnalysisUIDataTest, TheHostLearnsWhatChanged) {
   WithPoints([this](StabilizerEffect& effect, HX_InData&) {
-    const auto picture = Picture(160, 120);
-    Draw(effect, *picture);
+    Picture picture(160, 120);
+    Draw(effect, picture);
     ASSERT_EQ(windows().invalidations(), 1u);
     const HX_Rect changed = windows().last_invalidated();
     for (int y = 0; y < 120; ++y) {
       for (int x = 0; x < 160; ++x) {
         const bool inside =
             x >= changed.left && x < changed.right && y >= changed.top && y < changed.bottom;
-        ASSERT_TRUE(inside || ChannelAt(*picture, x, y, 1) == 0) << x << " " << y;
+        ASSERT_TRUE(inside || Drawn(picture, x, y, 0) == 0) << x << " " << y;
       }
     }
     EXPECT_GT(changed.left, 10);
     EXPECT_LT(changed.bottom, 90);
     for (const char* name : {"transfer", "World.NewWorld", "hls_to_rgb"}) {
       Operations::Get().FailNth(1, name);
-      EXPECT_THROW(Draw(effect, *picture), std::int32_t) << name;
+      EXPECT_THROW(Draw(effect, picture), std::int32_t) << name;
     }
     Operations::Get().FailNone();
     (*effect.GetState()->all_features.features)[0] = {-1e9f, 3e7f, 1, 0};
-    Draw(effect, *picture);
+    Draw(effect, picture);
     EXPECT_EQ(windows().last_invalidated().left, -20000);
     EXPECT_EQ(windows().last_invalidated().bottom, 20000);
   });
@@ -206,26 +204,26 @@ TEST_F(AnalysisUIDataTest, ColoursTellTracksAndWhatTheMouseIsAbout) {
     const auto expect_at = [&](const WorldBuffer& picture, int x, int y,
                                const TrackColors& colors) {
       const auto& fill = colors.fill;
-      EXPECT_NEAR(ChannelAt(picture, x, y, 1), fill.red * fill.alpha, 0.01);
-      EXPECT_NEAR(ChannelAt(picture, x, y, 2), fill.green * fill.alpha, 0.01);
-      EXPECT_NEAR(ChannelAt(picture, x, y, 3), fill.blue * fill.alpha, 0.01);
+      EXPECT_NEAR(Drawn(picture, x, y, 1), fill.red * fill.alpha, 0.01);
+      EXPECT_NEAR(Drawn(picture, x, y, 2), fill.green * fill.alpha, 0.01);
+      EXPECT_NEAR(Drawn(picture, x, y, 3), fill.blue * fill.alpha, 0.01);
       if (colors.line.alpha < 1) return;
       EXPECT_NEAR(ChannelAt(picture, x, y - 3, 1), colors.line.red, 0.01);
       EXPECT_NEAR(ChannelAt(picture, x, y - 3, 2), colors.line.green, 0.01);
       EXPECT_NEAR(ChannelAt(picture, x, y - 3, 3), colors.line.blue, 0.01);
     };
-    const auto first = Picture(160, 120), second = Picture(160, 120), hot = Picture(160, 120);
-    Draw(effect, *first);
+    Picture first(160, 120), second(160, 120), hot(160, 120);
+    Draw(effect, first);
     in.current_time = in.time_step;
-    Draw(effect, *second);
-    expect_at(*first, 20, 15, palette.ColorsOf(0, false, false));
-    expect_at(*second, 31, 27, palette.ColorsOf(0, false, false));
-    expect_at(*first, 100, 80, palette.ColorsOf(1, false, false));
-    expect_at(*second, 110, 90, palette.ColorsOf(1, false, false));
-    Draw(effect, *hot, {0, 2, 77}, {1, 2});
-    expect_at(*hot, 31, 27, palette.ColorsOf(0, true, false));
-    expect_at(*hot, 110, 90, palette.ColorsOf(1, false, true));
-    expect_at(*hot, 70, 65, palette.ColorsOf(2, true, true));
+    Draw(effect, second);
+    expect_at(first, 20, 15, palette.ColorsOf(0, false, false));
+    expect_at(second, 31, 27, palette.ColorsOf(0, false, false));
+    expect_at(first, 100, 80, palette.ColorsOf(1, false, false));
+    expect_at(second, 110, 90, palette.ColorsOf(1, false, false));
+    Draw(effect, hot, {0, 2, 77}, {1, 2});
+    expect_at(hot, 31, 27, palette.ColorsOf(0, true, false));
+    expect_at(hot, 110, 90, palette.ColorsOf(1, false, true));
+    expect_at(hot, 70, 65, palette.ColorsOf(2, true, true));
   });
 }
 
