@@ -18,6 +18,7 @@
 #include "stabilizer/effect/src/state_format/saved_state.h"
 #include "tests/support/controls.h"
 #include "tests/support/held_work.h"
+#include "tests/support/kept_state.h"
 #include "tests/support/shaky_clip.h"
 
 namespace kelp::effect {

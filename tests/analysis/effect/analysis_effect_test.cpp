@@ -87,14 +87,15 @@ TEST(AnalysisEffectTest, TheCurrentFrameIsTheLayersTimeBehindItsInPoint) {
     EXPECT_EQ(frame_at(c.start, c.time, c.clamped).frame, c.frame) << c.start << " " << c.time;
   }
   hosted.Inside([](StabilizerEffect& effect) {
-    effect.GetState()->job_input.FieldType = 1;  // rows are fields
-    effect.GetState()->all_features.frame_count = 40;
+    KeepFieldType(*effect.GetState(), 1);  // rows are fields
+    auto table = TableOf(*effect.GetState());
+    table.frame_count = 40;
+    KeepTable(*effect.GetState(), table);
   });
   EXPECT_EQ(frame_at(10, 7, true).frame, 27);  // 7 half frames behind 2 * 10
   Operations::Get().FailAlways("Utility.GetStartFrame");
   EXPECT_FALSE(frame_at(10, 7, true).valid);
   Operations::Get().FailNone();
-  hosted.Inside([](StabilizerEffect& effect) { effect.GetState()->all_features.frame_count = 20; });
 }
 
 }  // namespace

@@ -100,7 +100,7 @@ TEST(AnalysisServiceTest, TheUsersDetailedAnalysisTracksMore) {
   const auto slots = [&] {
     std::int32_t count = 0;
     hosted.Inside([&](kelp::effect::StabilizerEffect& effect) {
-      count = effect.GetState()->all_features.feature_count;
+      count = TableOf(*effect.GetState()).feature_count;
     });
     return count;
   };

@@ -39,12 +39,14 @@ class AnalysisUIDataTest : public ::testing::Test {
   // In a call of the host's, at the first frame, with these cells of both frames.
   void WithCells(const Cells& cells, const Look& look) {
     hosted_.Inside([&](StabilizerEffect& effect) {
-      auto& table = effect.GetState()->all_features;
-      table.feature_count = static_cast<std::int32_t>(cells.size() / 2);
+      marrow::tracking::AllFeatures table;
+      table.first_frame = 10;
       table.frame_count = 2;
-      table.features = boost::make_shared<Cells>(cells);
+      table.feature_count = static_cast<std::int32_t>(cells.size() / 2);
+      *table.features = cells;
+      KeepTable(*effect.GetState(), table);
       look(effect, *effect.context().in);
-      table = {};
+      KeepTable(*effect.GetState(), {});
     });
   }
   void WithPoints(const Look& look) {
@@ -105,7 +107,6 @@ TEST_F(AnalysisUIDataTest, PointsAreTheLiveCellsOfTheFrame) {
   WithPoints([](StabilizerEffect& effect, HX_InData& in) {
     const AnalysisUIData first(effect);
     EXPECT_EQ(first.frame(), 0);
-    EXPECT_EQ(first.analysis(), effect.GetState()->source_identity);
     EXPECT_THAT(Tracks(first.points()), ElementsAre(0, 1, 5));
     EXPECT_EQ(first.points()->at(0).x, 20.25f);
     EXPECT_EQ(first.points()->at(0).y, 15.5f);
@@ -114,6 +115,8 @@ TEST_F(AnalysisUIDataTest, PointsAreTheLiveCellsOfTheFrame) {
     in.current_time = in.time_step;
     const AnalysisUIData second(effect);
     EXPECT_EQ(second.frame(), 1);
+    EXPECT_EQ(second.analysis(), first.analysis());
+    EXPECT_FALSE(first.analysis().IsNil());
     EXPECT_THAT(Tracks(second.points()), ElementsAre(0, 3, 5));
     EXPECT_EQ(second.points()->at(0).goes_on, 0) << "there is no next frame";
   });
@@ -129,7 +132,7 @@ TEST_F(AnalysisUIDataTest, PointsAreTheLiveCellsOfTheFrame) {
     });
   }
   WithCells({}, [](StabilizerEffect& effect, HX_InData&) {
-    effect.GetState()->all_features = {};
+    KeepTable(*effect.GetState(), {});
     EXPECT_THAT(*AnalysisUIData(effect).points(), IsEmpty());
     EXPECT_TRUE(AnalysisUIData(effect).analysis().IsNil());
   });
@@ -188,7 +191,7 @@ TEST_F(AnalysisUIDataTest, TheHostLearnsWhatChanged) {
       EXPECT_THROW(Draw(effect, picture), std::int32_t) << name;
     }
     Operations::Get().FailNone();
-    (*effect.GetState()->all_features.features)[0] = {-1e9f, 3e7f, 1, 0};
+    (*TableOf(*effect.GetState()).features)[0] = {-1e9f, 3e7f, 1, 0};
     Draw(effect, picture);
     EXPECT_EQ(windows().last_invalidated().left, -20000);
     EXPECT_EQ(windows().last_invalidated().bottom, 20000);

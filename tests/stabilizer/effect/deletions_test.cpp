@@ -55,7 +55,7 @@ class DeletionsTest : public ::testing::Test {
   }
   void SolveTracks(bool with_walker) {
     hosted.Inside([=](StabilizerEffect& effect) {
-      effect.GetState()->all_features = Tracks(with_walker);
+      KeepTable(*effect.GetState(), Tracks(with_walker));
       effect.GetState()->MakeResultIdentityUnique();
       effect.MarkNeedsSolve();
     });
@@ -76,7 +76,7 @@ class DeletionsTest : public ::testing::Test {
   std::int32_t StatusOf(std::int32_t slot) {
     std::int32_t status = 0;
     hosted.Inside([&](StabilizerEffect& effect) {
-      status = (*effect.GetState()->all_features.features)[slot].status;
+      status = (*TableOf(*effect.GetState()).features)[slot].status;
     });
     return status;
   }
@@ -190,13 +190,16 @@ TEST_F(DeletionsTest, AProjectSavedDuringTheSolveSolvesItAgain) {
 TEST_F(DeletionsTest, AnalyzeForgetsThem) {
   hosted.SetDeletions({7});
   EXPECT_EQ(hosted.Settle(), 8);
-  hosted.Set(kDetailedAnalysis, 1);
+  Operations::Get().FailNth(1, "Param Utils.SetParamValue");
+  EXPECT_EQ(hosted.Set(kDetailedAnalysis, 1).code, kFaultCode);
+  EXPECT_EQ(hosted.Deletions(), std::vector<std::uint64_t>{7});
+  hosted.Set(kDetailedAnalysis, 0);
   EXPECT_TRUE(hosted.Deletions().empty());
   const auto value = [this] {
     return hosted.effect().Param(hosted.deletions_index())->u.arb_d.value;
   };
   const HX_Handle empty = value();
-  hosted.Set(kDetailedAnalysis, 0);
+  hosted.Set(kDetailedAnalysis, 1);
   EXPECT_EQ(value(), empty) << "empty already";
 }
 

@@ -59,6 +59,10 @@ TEST_F(RenderServiceTest, DrawsTheWarpAtEveryDepthOnBothPaths) {
       EXPECT_EQ(Sides(whole->rect()), (Rect{-4, -2, 69, 51}));
       ExpectShown(*whole, 26, 18, column, row);
       EXPECT_EQ(ChannelAt(*whole, frame ? -4 : 68, 18, 0), 0) << "outside of the frame";
+      if (depth == 8) {  // a renderer that has planned nothing
+        const RenderedFrame fresh = hosted().effect().MakeRenderer()->Direct(Whole(frame));
+        EXPECT_TRUE(fresh.pixels && Same(*whole, *fresh.pixels));
+      }
       RenderRequest part{frame, depth};
       part.part = HX_Rect{10, 10, 40, 30};
       ExpectShown(*DrawBoth(part), 26, 18, column, row);
@@ -97,6 +101,8 @@ TEST_F(RenderServiceTest, EdgesAreFilledFromTheFramesAround) {
     // Above its 3, too: frame 3 begins at -4.
     EXPECT_NEAR(100 * ChannelAt(*middle, 30 - 8, 3 - 3, 2), 3 - 0.5, 0.4);
     EXPECT_EQ(ChannelAt(*middle, 0 - 8, 1 - 3, 0), 0) << "no frame reaches there";
+    // Above frame 2, left of frames 1 and 3: frame 0, two away.
+    EXPECT_NEAR(100 * ChannelAt(*middle, 4 + 6 - 8, 0 + 4 - 3, 1), 4 - 0.5, 0.4);
     // The first and the last frame have neighbours on one side: frames 1 and 3.
     for (const auto& [frame, shift] : {std::pair{0, 6}, {4, 12}}) {
       const auto end = DrawBoth(Whole(frame, depth));

@@ -58,7 +58,7 @@ TEST_F(RendererExportsTest, ABlocksAnswers) {
     crop->cropWidth = 40;
     crop->cropHeight = 30;
     crop->rects[1] = {1, 2, 3, 4};  // left, right, top, bottom
-    effect.GetState()->crop = crop;
+    KeepCrop(*effect.GetState(), crop);
     effect.PublishSharedData();
   });
   ASSERT_TRUE(Ask(block));

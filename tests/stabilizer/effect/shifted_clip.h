@@ -51,8 +51,8 @@ class ShiftedClipTest : public ::testing::Test {
     for (const auto& [index, value] : controls) hosted_->Set(index, value);
     ASSERT_EQ(hosted_->Settle(), 8);
     hosted_->Open(hosted_->Altered(hosted_->Save(), [&](kelp::effect::SavedState& state) {
-      state.warper = warper;
-      state.crop.reset();
+      KeepWarps(state, warper);
+      KeepCrop(state, {});
       if (change) change(state);
     }));
     ASSERT_TRUE(hosted_->effect().creation().ok());

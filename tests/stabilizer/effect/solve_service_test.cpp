@@ -91,20 +91,20 @@ TEST_F(SolveServiceTest, WarpsOfAnotherAnalysisAreNotReused) {
     const char* name;
     std::function<void(StabilizerState&)> change;
   } cases[] = {
-      {"none", [](StabilizerState& state) { state.warper.reset(); }},
+      {"none", [](StabilizerState& state) { KeepWarps(state, {}); }},
       {"new tracks", [](StabilizerState& state) { state.MakeResultIdentityUnique(); }},
       {"a start that failed",
        [](StabilizerState& state) { state.phase = kelp::effect::SolvePhase::AnalysisFailed; }},
       {"a frame less",
        [](StabilizerState& state) {
-         state.warper = ShiftingWarper(96, 64, {7, {0, 0}});
+         KeepWarps(state, ShiftingWarper(96, 64, {7, {0, 0}}));
        }},
       {"another width",
        [](StabilizerState& state) {
-         state.warper = ShiftingWarper(95, 64, {8, {0, 0}});
+         KeepWarps(state, ShiftingWarper(95, 64, {8, {0, 0}}));
        }},
       {"another height", [](StabilizerState& state) {
-         state.warper = ShiftingWarper(96, 63, {8, {0, 0}});
+         KeepWarps(state, ShiftingWarper(96, 63, {8, {0, 0}}));
        }}};
   for (const auto& c : cases) {
     EXPECT_EQ(run(c.change), "factorization crop ") << c.name;

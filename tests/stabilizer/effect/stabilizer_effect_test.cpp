@@ -59,7 +59,7 @@ TEST(StabilizerEffectTest, StatusOfAFrame) {
   hosted.Place(6, 4);
   expect(6, FrameStatus::Ready, none);
   expect(6, FrameStatus::OverCropped, [](StabilizerEffect& effect, StabilizerState& state) {
-    state.crop = boost::make_shared<cropper>(1, 96, 64);
+    KeepCrop(state, boost::make_shared<cropper>(1, 96, 64));
     EXPECT_TRUE(effect.IsFinishedStatus(FrameStatus::OverCropped));
   });
   hosted.Set(kFraming, 1);
@@ -76,8 +76,7 @@ TEST(StabilizerEffectTest, StatusOfAFrame) {
   });
   EXPECT_TRUE(hosted.Messages().empty()) << "the banner tells it";
   hosted.Refuse("");
-  expect(6, FrameStatus::PressAnalyze,
-         [](auto&, StabilizerState& state) { state.all_features = {}; });
+  expect(6, FrameStatus::PressAnalyze, [](auto&, StabilizerState& state) { KeepTable(state, {}); });
   expect(6, FrameStatus::TrackingFailed,
          [](StabilizerEffect& effect, auto&) { effect.MarkAnalysisFailed(); });
 }
@@ -113,6 +112,7 @@ TEST(StabilizerEffectTest, RenderersComeAndGoDuringAnAnalysis) {
   hosted.TickUntilHeld();
   EXPECT_TRUE(hosted.effect().MakeRenderer()->Planned({0}).pixels);
   EXPECT_EQ(hosted.Status(), 4);
+  EXPECT_EQ(hosted.Info().first, "") << "nothing was cancelled";
   hosted.Release();
   EXPECT_EQ(hosted.Settle(), 8);
 }
@@ -129,7 +129,7 @@ TEST(StabilizerEffectTest, AnOutsideRendererDrawsWhatIsSolvedAndWaitsForWhatIsNo
   EXPECT_EQ(hosted.Settle(), 8);
   EXPECT_TRUE(hosted.AllowsOutside());
   hosted.Inside([](StabilizerEffect& effect) {
-    effect.GetState()->crop.reset();
+    KeepCrop(*effect.GetState(), {});
     effect.PublishSharedData();
   });
   EXPECT_FALSE(hosted.AllowsOutside()) << "nothing to crop by";

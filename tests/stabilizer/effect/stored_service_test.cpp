@@ -215,7 +215,7 @@ TEST_F(StoredServiceTest, TheCounterOfAProjectIsSetRight) {
   saved.values[Session::kStatusDiskId] = 504;
   hosted.Open(hosted.Altered(saved, [](kelp::effect::SavedState& state) {
     state.phase = kelp::effect::SolvePhase::Failed;
-    state.warper.reset();
+    KeepWarps(state, {});
   }));
   EXPECT_EQ(hosted.Status(), 10);
 }

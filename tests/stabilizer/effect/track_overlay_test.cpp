@@ -20,10 +20,11 @@ class ExperimentalTrackOverlayTest : public ShiftedClipTest {
     if (!kelp::effect::ShowsExperimentalParameters()) GTEST_SKIP();
     Load(kelp::effect::ShiftingWarper(kWidth, kHeight, {{0, 0}, {10, 6}}),
          {{kFraming, 1}, {kShowTracks, 1}}, Ramp, [](kelp::effect::SavedState& state) {
-           state.all_features.feature_count = 1;
-           state.all_features.features =
-               boost::make_shared<std::vector<marrow::tracking::tracking_feature<float>>>();
-           *state.all_features.features = {{20, 20, 1, 1}, {24, 23, 0, 1}};
+           marrow::tracking::AllFeatures table;
+           table.frame_count = 2;
+           table.feature_count = 1;
+           *table.features = {{20, 20, 1, 1}, {24, 23, 0, 1}};
+           KeepTable(state, table);
          });
   }
   // Pixels of a whole frame that are not the source's.
@@ -73,7 +74,9 @@ TEST_F(ExperimentalTrackOverlayTest, ShownWhileADeletionIsSolvedAndNotOutsideThe
   EXPECT_NEAR(Changed(*DrawBoth({1})), kDot, 8);
   hosted().Place(1, 1);
   hosted().Inside([](kelp::effect::StabilizerEffect& effect) {
-    effect.GetState()->first_frame = 3;
+    auto table = TableOf(*effect.GetState());
+    table.first_frame = 3;
+    KeepTable(*effect.GetState(), table);
     effect.PublishSharedData();
   });
   EXPECT_EQ(Changed(*DrawBoth({0})), 0);
