@@ -3,6 +3,7 @@
 #include <cstring>
 #include <new>
 #include <stdexcept>
+#include <utility>
 
 #include "host/base/operations.h"
 #include "host/effects/interface_tables.h"
@@ -30,7 +31,10 @@ Host* Host::active() {
 }
 
 Host::Host(const std::string& library, const HostSettings& settings)
-    : settings_(settings), library_(library), media_(settings.media), declarations_(1) {
+    : Host(PluginLibrary(library), settings) {}
+
+Host::Host(PluginLibrary library, const HostSettings& settings)
+    : settings_(settings), library_(std::move(library)), media_(settings.media), declarations_(1) {
   Host* none = nullptr;
   if (!active_host.compare_exchange_strong(none, this)) {
     throw std::logic_error("a process has one host at a time");

@@ -36,6 +36,7 @@ class Host {
   // Loads the library, starts the plug-in and collects its parameters. Throws PluginError, whose
   // line names the file and the cause.
   explicit Host(const std::string& library, const HostSettings& settings = {});
+  explicit Host(PluginLibrary library, const HostSettings& settings = {});
   // Stop, if it was not called.
   ~Host();
   Host(const Host&) = delete;

@@ -54,4 +54,11 @@ PluginLibrary::PluginLibrary(const std::string& path) : path_(path) {
   exports_.fcd_table = dlsym(library_.get(), HX_EXPORT_FCD_TABLE);
 }
 
+PluginLibrary::PluginLibrary(HX_EffectMain linked_entry, const PluginProperties& record,
+                             const PluginExports& linked_exports)
+    : path_(record.match_name),
+      properties_(record),
+      entry_(linked_entry),
+      exports_(linked_exports) {}
+
 }  // namespace calmframe::host

@@ -18,13 +18,17 @@ struct PluginExports {
   const void* fcd_table = nullptr;
 };
 
-// A plug-in's library in this process; nothing of it has been called. Unloaded by the destructor.
+// A plug-in in this process; nothing of it has been called. Its library is unloaded by the
+// destructor.
 class PluginLibrary {
  public:
   // Throws PluginError, whose line names the file and the cause.
   explicit PluginLibrary(const std::string& path);
+  // One that is part of the program: its entry, and what a property record would tell.
+  PluginLibrary(HX_EffectMain linked_entry, const PluginProperties& record,
+                const PluginExports& linked_exports = {});
 
-  const std::string& path() const { return path_; }
+  const std::string& path() const { return path_; }  // of the program's own: the match name
   const PluginProperties& properties() const { return properties_; }
   HX_EffectMain entry() const { return entry_; }
   const PluginExports& exports() const { return exports_; }

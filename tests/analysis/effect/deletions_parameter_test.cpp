@@ -4,11 +4,13 @@
 
 #include <vector>
 
-#include "tests/analysis/effect/test_effect.h"
+#include "tests/support/hosted_effect.h"
 
 namespace kelp::analysis::effect {
 namespace {
 
+using calmframe::host::HostedEffect;
+using calmframe::host::Operations;
 using Key = DeletedTrackPoints::Key;
 using ::testing::ElementsAre;
 
@@ -39,9 +41,9 @@ HX_CustomDataExtra Extra(std::int32_t op, HX_Handle a = nullptr, HX_Handle b = n
 }
 
 // The operations through the effect's entry.
-class DeletionsParameterTest : public EffectTest {
+class DeletionsParameterTest : public ::testing::Test {
  protected:
-  HX_Err Run(HX_CustomDataExtra& extra) { return Call(HX_CMD_CUSTOM_DATA_OP, &extra); }
+  HX_Err Run(HX_CustomDataExtra& extra) { return hosted_.DataOp(extra).code; }
   HX_CustomDataExtra Op(std::int32_t op, HX_Handle a = nullptr, HX_Handle b = nullptr) {
     HX_CustomDataExtra extra = Extra(op, a, b);
     EXPECT_EQ(Run(extra), HX_ERR_NONE) << op;
@@ -61,6 +63,8 @@ class DeletionsParameterTest : public EffectTest {
     EXPECT_EQ(Run(extra), HX_ERR_NONE);
     return keys;
   }
+
+  HostedEffect hosted_{calmframe::host::SmallClip(), {.keeps_deletions = true}};
 };
 
 TEST_F(DeletionsParameterTest, OperationsOnValues) {
@@ -86,7 +90,6 @@ TEST_F(DeletionsParameterTest, OperationsOnValues) {
   other.param_id = 304;
   EXPECT_EQ(Run(other), HX_ERR_NONE);
   for (const std::int32_t op : {-1, 8}) EXPECT_EQ(Op(op, copy).out, nullptr);
-  EXPECT_EQ(Call(HX_CMD_CUSTOM_DATA_OP), HX_ERR_NONE);
   Key key = 1;
   HX_CustomDataExtra torn = Extra(HX_DATA_UNFLATTEN);
   torn.buffer = &key;
@@ -105,13 +108,13 @@ TEST_F(DeletionsParameterTest, FaultsInEachOperation) {
       HX_CustomDataExtra extra = Extra(op, operand, b);
       extra.buffer = room;
       extra.size = 16;
-      host_.ForgetOperations();
-      host_.FailOperation(n);
-      const HX_Err code = Run(extra);
-      host_.FailOperation(0);
-      const bool failed = host_.operations().size() >= static_cast<std::size_t>(n);
+      Operations::Get().FailNth(n);
+      HX_Err code = HX_ERR_NONE;
+      const auto names = HostedEffect::OperationsOf([&] { code = Run(extra); });
+      Operations::Get().FailNone();
+      const bool failed = names.size() >= static_cast<std::size_t>(n);
       if (failed) {
-        const bool lock = host_.operations().back().name == "lock_handle";
+        const bool lock = names.back() == "lock_handle";
         EXPECT_EQ(code, lock ? HX_ERR_HANDLE_LOCK : HX_ERR_MEMORY) << op;
         EXPECT_EQ(extra.out, nullptr);
       } else {

@@ -5,10 +5,14 @@
 #include <cmath>
 #include <map>
 
-#include "tests/effect/fake_host.h"
+#include "stabilizer/effect/src/stabilizer_effect.h"
+#include "tests/support/hosted_effect.h"
 
 namespace kelp::analysis::effect {
 namespace {
+
+using calmframe::host::HostedEffect;
+using calmframe::host::Operations;
 
 TEST(TrackColorsTest, HuesLeaveTheYellowsFreeAndAreAllInUse) {
   // 997 n / 12 modulo 300, moved by 60 when above 30.
@@ -30,30 +34,35 @@ TEST(TrackColorsTest, HuesLeaveTheYellowsFreeAndAreAllInUse) {
 }
 
 TEST(TrackColorsTest, LineAndFillByWhatTheMouseIsAbout) {
-  FakeHost host;
-  const kelp::effect::HostContext context{0, &host.in, &host.out, nullptr, nullptr, nullptr};
+  HostedEffect hosted(calmframe::host::SmallClip());
+  hosted.Apply();
   std::int32_t red = 0;
   while (TrackHueNumber(red) != 0) ++red;
-  TrackPalette palette(context);
-  const auto expect = [&](bool selected, bool hovered, const tesselui::drawbot::Color& line,
-                          const tesselui::drawbot::Color& fill) {
-    const TrackColors colors = palette.ColorsOf(red, selected, hovered);
-    for (const auto& [is, should] : {std::pair{colors.line, line}, {colors.fill, fill}}) {
-      EXPECT_NEAR(is.red, should.red, 0.002);
-      EXPECT_NEAR(is.green, should.green, 0.002);
-      EXPECT_NEAR(is.blue, should.blue, 0.002);
-      EXPECT_FLOAT_EQ(is.alpha, should.alpha);
-    }
-  };
-  expect(false, false, {1, 0.4f, 0.4f, 1}, {0.6f, 0.24f, 0.24f, 0.65f});
-  expect(false, true, {0.6f, 0.24f, 0.24f, 0.65f}, {1, 1, 1, 0.75f});
-  expect(true, false, {1, 1, 0.4f, 0.75f}, {1, 1, 0.7f, 0.75f});
-  expect(true, true, {1, 1, 0.7f, 0.75f}, {1, 1, 1, 0.75f});
-  for (std::int32_t id = 0; id < 100; ++id) palette.ColorsOf(id, false, false);
-  EXPECT_LE(host.Count("hls_to_rgb"), 13);
-  host.FailOperation(1);
-  TrackPalette fresh(context);
-  EXPECT_THROW(fresh.ColorsOf(1, false, false), std::int32_t);
+  hosted.Inside([red](kelp::effect::StabilizerEffect& effect) {
+    TrackPalette palette(effect.context());
+    const auto expect = [&](bool selected, bool hovered, const tesselui::drawbot::Color& line,
+                            const tesselui::drawbot::Color& fill) {
+      const TrackColors colors = palette.ColorsOf(red, selected, hovered);
+      for (const auto& [is, should] : {std::pair{colors.line, line}, {colors.fill, fill}}) {
+        EXPECT_NEAR(is.red, should.red, 0.002);
+        EXPECT_NEAR(is.green, should.green, 0.002);
+        EXPECT_NEAR(is.blue, should.blue, 0.002);
+        EXPECT_FLOAT_EQ(is.alpha, should.alpha);
+      }
+    };
+    expect(false, false, {1, 0.4f, 0.4f, 1}, {0.6f, 0.24f, 0.24f, 0.65f});
+    expect(false, true, {0.6f, 0.24f, 0.24f, 0.65f}, {1, 1, 1, 0.75f});
+    expect(true, false, {1, 1, 0.4f, 0.75f}, {1, 1, 0.7f, 0.75f});
+    expect(true, true, {1, 1, 0.7f, 0.75f}, {1, 1, 1, 0.75f});
+    const auto asked = HostedEffect::OperationsOf([&] {
+      for (std::int32_t id = 0; id < 100; ++id) palette.ColorsOf(id, false, false);
+    });
+    EXPECT_EQ(asked.size(), 11u) << "each hue once";
+    Operations::Get().FailNth(1);
+    TrackPalette fresh(effect.context());
+    EXPECT_THROW(fresh.ColorsOf(1, false, false), std::int32_t);
+    Operations::Get().FailNone();
+  });
 }
 
 }  // namespace

@@ -1,55 +1,25 @@
 #include <gtest/gtest.h>
 
 #include <boost/make_shared.hpp>
-#include <cstdint>
 #include <vector>
 
+#include "effect/parameter_row.h"
 #include "stabilization/warp/frame_map.h"
-#include "tests/stabilizer/effect/render_service_fixture.h"
+#include "tests/stabilizer/effect/shifted_clip.h"
 
-namespace kelp::effect {
+namespace calmframe::host {
 namespace {
-
-using marrow::stabilization::point2;
-
-// What the blur suite was asked; it copies.
-struct BlurCalls {
-  int count = 0;
-  HX_Err answer = HX_ERR_NONE;
-  static BlurCalls& Get() {
-    static BlurCalls calls;
-    return calls;
-  }
-};
-
-HX_Err CopyAsBlur(HX_EffectRef, const HX_World* from, HX_World* to, float radius,
-                  std::int32_t passes, std::int32_t mode, std::int32_t reserved,
-                  std::int32_t flag) {
-  ++BlurCalls::Get().count;
-  EXPECT_EQ(radius, 2.5f);
-  EXPECT_EQ(passes, 1);
-  EXPECT_EQ(mode, 110);
-  EXPECT_EQ(reserved, 0);
-  EXPECT_EQ(flag, 1);
-  for (const HX_World* world : {from, static_cast<const HX_World*>(to)}) {
-    EXPECT_EQ(world->origin_x, 0);
-    EXPECT_EQ(world->origin_y, 0);
-  }
-  for (int y = 0; y < from->height; ++y) {
-    for (int x = 0; x < from->width; ++x) StoreFakePixel(*to, x, y, LoadFakePixel(*from, x, y));
-  }
-  return BlurCalls::Get().answer;
-}
 
 // Seven frames of speeds 0 8 4 7 3 0 0; every pair's motion is known. One picture stands for all
 // frames, so that what is taken agrees.
-class DeblurServiceTest : public RenderServiceTest {
+class ExperimentalDeblurTest : public ShiftedClipTest {
  protected:
   void SetUp() override {
     using marrow::stabilization::CPWarper;
     using marrow::stabilization::MtoNMap;
+    if (!kelp::effect::ShowsExperimentalParameters()) GTEST_SKIP();
     const double shifts[] = {0, 0, 8, 4, 1, 1, 1};
-    std::vector<point2> points;
+    Shifts points;
     MtoNMap::entries_t pairs;
     for (int n = 0; n < 7; ++n) {
       points.push_back({shifts[n], 0});
@@ -58,100 +28,56 @@ class DeblurServiceTest : public RenderServiceTest {
       }
     }
     const auto warper =
-        boost::const_pointer_cast<CPWarper>(ShiftingWarper(kWidth, kHeight, points));
+        boost::const_pointer_cast<CPWarper>(kelp::effect::ShiftingWarper(kWidth, kHeight, points));
     warper->setFrameMap(boost::make_shared<MtoNMap>(7, 6, pairs));
-    test.Solved(warper, {});
-    test.RenderCopy();
-    SetFraming(Framing::synthesize_edges);
-    test.Set(kSynthesisInputRangeIndex, 0.01);  // no margin of its own
-    test.Set(kDeblurIndex, 1);
-    test.Set(kDeblurComparisonBlurIndex, 2.5);
-    static constexpr HX_BlurSuite1 kBlur = {CopyAsBlur};
-    test.host.Offer(HX_BLUR_SUITE, HX_BLUR_SUITE_VERSION, &kBlur);
-    BlurCalls::Get() = {};
-    test.host.in.current_time = 3;
+    Load(warper,
+         {{kFraming, 4},
+          {kSynthesisInputRange, 0.01},  // no margin of its own
+          {kDeblur, 1},
+          {kDeblurComparisonBlur, 2.5}},
+         [](std::int64_t, int x, int y) { return Ramp(4, x, y); });
   }
+  HX_Err Code(std::int64_t frame) { return hosted().Render(frame, 8, Path::direct).result.code; }
 };
 
-TEST_F(DeblurServiceTest, APlanOrdersWhatMayBeTaken) {
-  using Ids = std::vector<std::int32_t>;
-  const auto ids = [&] {
-    EXPECT_EQ(test.Plan({0, 0, 64, 48}, 8), HX_ERR_NONE);
-    Ids found;
-    for (const auto& order : test.orders) found.push_back(order.first);
-    return found;
-  };
-  test.Set(kDeblurFrameRangeIndex, 2.9);
-  EXPECT_EQ(ids(), (Ids{1, 2, 3, 4, 5}));
-  SetFraming(Framing::crop);
-  EXPECT_EQ(ids(), (Ids{1, 2, 3, 4, 5}));
-  SetFraming(Framing::synthesize_edges);
-  test.Set(kDeblurDebugIndex, static_cast<int>(DeblurDebug::aligned_frame));
-  test.Set(kAlignedFrameIndex, -3);
-  EXPECT_EQ(ids(), (Ids{0, 1, 2, 3, 4, 5, 6}));
-  TestWorld output(kWidth, kHeight, 8);
-  EXPECT_EQ(test.RenderPlan(output, 8), HX_ERR_NONE);
-  test.Set(kDeblurIndex, 0);
-  EXPECT_EQ(ids(), (Ids{3}));
+TEST_F(ExperimentalDeblurTest, APlanOrdersWhatMayBeTaken) {
+  hosted().Set(kDeblurFrameRange, 2.9);
+  EXPECT_EQ(OrdersOf(3), 5u);
+  EXPECT_EQ(OrdersOf(1), 4u) << "nothing before the first";
+  hosted().Set(kFraming, 1);
+  EXPECT_EQ(OrdersOf(3), 5u);
+  hosted().Set(kDeblurDebug, 6);
+  hosted().Set(kAlignedFrame, -3);
+  EXPECT_EQ(OrdersOf(3), 7u);
+  hosted().Set(kDeblur, 0);
+  EXPECT_EQ(OrdersOf(3), 1u);
 }
 
-TEST_F(DeblurServiceTest, BothPathsTakeTheSharperFrameAtEveryDepth) {
-  test.Set(kShowDeblurMapIndex, 1);
-  for (const std::int32_t depth : {8, 16, 32}) {
-    UseDepth(depth);
-    BlurCalls::Get() = {};
-    ASSERT_EQ(test.Plan({-100, -100, 200, 200}, depth), HX_ERR_NONE);
-    const HX_Rect& full = test.plan.full_rect;
-    const int width = full.right - full.left, height = full.bottom - full.top;
-    TestWorld planned(width, height, depth, full.left, full.top);
-    ASSERT_EQ(test.RenderPlan(planned, depth), HX_ERR_NONE);
-    EXPECT_EQ(BlurCalls::Get().count, 2);
-    for (const int channel : {0, 1, 2, 3}) EXPECT_EQ(planned.At(30, 20, channel), 1);
-    EXPECT_EQ(planned.At(0, 20, 1), 0) << "outside of the frame, which lies 4 to the right";
-    EXPECT_EQ(planned.At(0, 20, 0), 1);
-    if (depth == 32) continue;
-    TestWorld direct(width, height, depth, full.left, full.top);
-    ASSERT_EQ(RenderDirect(direct), HX_ERR_NONE);
-    EXPECT_TRUE(direct == planned);
+TEST_F(ExperimentalDeblurTest, BothPathsTakeTheSharperFrameAtEveryDepth) {
+  hosted().Set(kShowDeblurMap, 1);
+  for (const int depth : {8, 16, 32}) {
+    const auto names = HostedEffect::OperationsOf([&] { Draw(Whole(3, depth)); });
+    EXPECT_EQ(std::count(names.begin(), names.end(), "Blur.Blur"), 2);
+    const auto map = DrawBoth(Whole(3, depth));
+    for (const int channel : {0, 1, 2, 3}) EXPECT_EQ(ChannelAt(*map, 30, 20, channel), 1);
+    const int left = map->rect().left;
+    EXPECT_EQ(ChannelAt(*map, left, 20, 1), 0) << "outside of the frame, which lies further right";
+    EXPECT_EQ(ChannelAt(*map, left, 20, 0), 1);
   }
 }
 
-TEST_F(DeblurServiceTest, AHostWithoutTheBlurIsTold) {
-  TestWorld output(kWidth, kHeight, 8);
-  test.host.RefuseSuite(HX_BLUR_SUITE);
-  EXPECT_EQ(RenderDirect(output), HX_ERR_MISSING_SUITE);
-  EXPECT_STREQ(test.host.out.return_msg, "Not able to acquire OVK Suite.");
-  test.host.in.current_time = 5;  // which is slow
-  EXPECT_EQ(RenderDirect(output), HX_ERR_NONE);
-  test.host.OfferAllSuites();
-  test.host.in.current_time = 3;
-  BlurCalls::Get().answer = 77;
-  EXPECT_EQ(RenderDirect(output), 77);
-  BlurCalls::Get().answer = HX_ERR_NONE;
-  EXPECT_EQ(RenderDirect(output), HX_ERR_NONE);
-}
-
-// What was taken is given back, or the fake host complains at its end.
-TEST_F(DeblurServiceTest, EveryCallMayFail) {
-  for (int n = 1; n < 500; ++n) {
-    test.host.ForgetOperations();
-    test.host.FailOperation(n);
-    TestWorld output(kWidth, kHeight, 8);
-    HX_Err code = test.Call(HX_CMD_PREPARE_FRAME);
-    if (code == HX_ERR_NONE) code = test.Call(HX_CMD_RENDER_FRAME, output.get());
-    const auto& operations = test.host.operations();
-    if (operations.size() < static_cast<std::size_t>(n)) {
-      EXPECT_EQ(code, HX_ERR_NONE);
-      EXPECT_GE(test.host.Count("acquire FLT Blur Suite 1"), 2);
-      test.host.FailOperation(0);
-      return;
-    }
-    if (operations[static_cast<std::size_t>(n) - 1].name == "acquire FLT Blur Suite 1") {
-      EXPECT_EQ(code, HX_ERR_MISSING_SUITE);
-    }
-  }
-  FAIL() << "no end of host calls";
+TEST_F(ExperimentalDeblurTest, AHostWithoutTheBlurIsTold) {
+  Operations::Get().FailAlways("acquire " HX_BLUR_SUITE);
+  EXPECT_EQ(Code(3), HX_ERR_MISSING_SUITE);
+  EXPECT_EQ(hosted().Messages().at(0), "Not able to acquire OVK Suite.");
+  EXPECT_EQ(Code(5), HX_ERR_NONE) << "which is slow";
+  Operations::Get().FailNone();
+  Operations::Get().FailAlways("Blur.Blur");
+  EXPECT_EQ(Code(3), kFaultCode);
+  Operations::Get().FailNone();
+  EXPECT_EQ(Code(3), HX_ERR_NONE);
+  FailEachOperation({3}, Path::planned, [](const std::string&, HX_Err) {});
 }
 
 }  // namespace
-}  // namespace kelp::effect
+}  // namespace calmframe::host

@@ -3,123 +3,161 @@
 #include <gtest/gtest.h>
 
 #include <boost/make_shared.hpp>
+#include <thread>
 
-#include "tests/stabilizer/effect/stabilizer_host.h"
+#include "tests/support/hosted_effect.h"
+#include "tests/support/shifting_warper.h"
 
-namespace kelp::effect {
+namespace calmframe::host {
 namespace {
 
-using analysis::FrameStatus;
+using kelp::analysis::FrameStatus;
+using kelp::effect::SolvePhase;
+using kelp::effect::StabilizerEffect;
+using kelp::effect::StabilizerState;
 
-TEST(StabilizerEffectTest, DeclaresTheVisibleParameters) {
-  StabilizerHost test;
-  EXPECT_EQ(test.host.params.size(), 31u);
-  EXPECT_EQ(test.Name(kSmoothnessIndex), "Smoothness");
-  EXPECT_EQ(test.Name(kSynthesisInputRangeIndex), "Synthesis Input Range (seconds)");
-  EXPECT_STREQ(test.host.params[kFramingIndex].u.pd.items,
-               "Stabilize Only|Stabilize, Crop|Stabilize, Crop, Auto-scale|Stabilize, Synthesize "
-               "Edges");
-  EXPECT_STREQ(test.host.params[kAnalyzeIndex].u.button.label, "Analyze");
-  EXPECT_EQ(test.host.params[kCancelIndex].disk_id, 11);
-  // A hidden parameter costs no call of the host.
-  test.host.ForgetOperations();
-  EXPECT_EQ(test.Effect().GetIntParam(59), 9);
-  EXPECT_TRUE(test.host.operations().empty());
-}
-
+// Of frames 5 to 12 of the source.
 TEST(StabilizerEffectTest, StatusOfAFrame) {
-  StabilizerHost test(20);
-  test.layer.start = 5;
-  StabilizerState& state = test.Analysed(ShakenTable(20, 4));
-  StabilizerEffect effect = test.Effect();
-  const auto at = [&](std::int64_t frame) { return effect.GetStatusForFrame(frame); };
-
-  EXPECT_EQ(at(5), FrameStatus::SolveInProgress);
-  state.first_analysis = false;
-  EXPECT_EQ(at(24), FrameStatus::SubsequentSolve);
-  state.subsequent_solve = true;
-  EXPECT_EQ(at(24), FrameStatus::SubsequentSolveOnDeletion);
-  effect.MarkNeedsSolve();
-  EXPECT_EQ(at(24), FrameStatus::SubsequentSolve);
-  for (const std::int64_t outside : {4, 25}) {
-    EXPECT_EQ(at(outside), FrameStatus::OutsideRange);
-    effect.MarkAnalysisFailed();
-    EXPECT_EQ(at(outside), FrameStatus::TrackingFailed);
-    state.phase = SolvePhase::None;
+  HostedEffect hosted(SmallClip("statuses", 20));
+  hosted.Place(5, 8);
+  ASSERT_EQ(hosted.Analyse(), 8);
+  // After a change of what the instance keeps; where the layer stands is looked up with each call.
+  const auto expect = [&](std::int64_t frame, FrameStatus status,
+                          const std::function<void(StabilizerEffect&, StabilizerState&)>& change) {
+    hosted.Inside([&](StabilizerEffect& effect) {
+      change(effect, *effect.GetState());
+      EXPECT_EQ(effect.GetStatusForFrame(frame), status) << frame;
+    });
+  };
+  const auto none = [](StabilizerEffect&, StabilizerState&) {};
+  expect(5, FrameStatus::Ready, none);
+  expect(12, FrameStatus::SolveInProgress, [](StabilizerEffect& effect, StabilizerState& state) {
+    effect.MarkNeedsSolve();
+    state.first_analysis = true;
+  });
+  expect(12, FrameStatus::SubsequentSolve,
+         [](auto&, StabilizerState& state) { state.first_analysis = false; });
+  expect(12, FrameStatus::SubsequentSolveOnDeletion,
+         [](auto&, StabilizerState& state) { state.subsequent_solve = true; });
+  expect(12, FrameStatus::SubsequentSolve,
+         [](StabilizerEffect& effect, auto&) { effect.MarkNeedsSolve(); });
+  for (const std::int64_t outside : {4, 13}) {
+    expect(outside, FrameStatus::OutsideRange, none);
+    expect(outside, FrameStatus::TrackingFailed,
+           [](StabilizerEffect& effect, auto&) { effect.MarkAnalysisFailed(); });
+    expect(outside, FrameStatus::OutsideRange,
+           [](auto&, StabilizerState& state) { state.phase = SolvePhase::None; });
   }
-  state.phase = SolvePhase::Failed;
-  EXPECT_EQ(at(5), FrameStatus::SolveFailed);
-  test.layer.count = 30;
-  EXPECT_EQ(at(5), FrameStatus::SolveFailed);
-  state.phase = SolvePhase::Solved;
-  state.needs_solve = false;
-  EXPECT_EQ(at(5), FrameStatus::RangeChanged);
-  test.layer.count = 10;
-  EXPECT_EQ(at(5), FrameStatus::Ready);
-
-  state.warper = ShiftingWarper(640, 360, {{0, 0}});
-  state.crop = boost::make_shared<cropper>(1, 640, 360);
-  EXPECT_EQ(at(5), FrameStatus::OverCropped);
-  EXPECT_TRUE(effect.IsFinishedStatus(FrameStatus::OverCropped));
-  test.Set(kFramingIndex, static_cast<int>(Framing::stabilize_only));
-  EXPECT_EQ(at(5), FrameStatus::Ready);
-
-  state.analysis_pending = true;
-  EXPECT_EQ(at(5), FrameStatus::AnalysisInProgress);
-  state.analysis_pending = false;
-  test.layer.refusal = u"No footage.";
-  EXPECT_EQ(at(5), FrameStatus::GeneralFailure);
-  EXPECT_EQ(state.error_text, "No footage.");
-  EXPECT_FALSE(test.host.ShowsMessage());
-  test.layer.refusal.clear();
-
-  state.all_features = {};
-  EXPECT_EQ(at(5), FrameStatus::PressAnalyze);
-  effect.MarkAnalysisFailed();
-  EXPECT_EQ(at(5), FrameStatus::TrackingFailed);
+  expect(5, FrameStatus::SolveFailed,
+         [](auto&, StabilizerState& state) { state.phase = SolvePhase::Failed; });
+  hosted.Place(5, 10);
+  expect(5, FrameStatus::SolveFailed, none);
+  expect(5, FrameStatus::RangeChanged, [](auto&, StabilizerState& state) {
+    state.phase = SolvePhase::Solved;
+    state.needs_solve = false;
+  });
+  hosted.Place(6, 4);
+  expect(6, FrameStatus::Ready, none);
+  expect(6, FrameStatus::OverCropped, [](StabilizerEffect& effect, StabilizerState& state) {
+    KeepCrop(state, boost::make_shared<cropper>(1, 96, 64));
+    EXPECT_TRUE(effect.IsFinishedStatus(FrameStatus::OverCropped));
+  });
+  hosted.Set(kFraming, 1);
+  expect(6, FrameStatus::Ready, none);
+  expect(6, FrameStatus::AnalysisInProgress,
+         [](auto&, StabilizerState& state) { state.analysis_pending = true; });
+  hosted.Refuse("No footage.");
+  expect(6, FrameStatus::GeneralFailure,
+         [](auto&, StabilizerState& state) { state.analysis_pending = false; });
+  hosted.Inside([](StabilizerEffect& effect) {
+    const kelp::analysis::effect::StatusRecord told{FrameStatus::GeneralFailure, "No footage."};
+    EXPECT_EQ(effect.GetStatusRecord(), told);
+    EXPECT_FALSE(effect.IsRenderableFrame());
+  });
+  EXPECT_TRUE(hosted.Messages().empty()) << "the banner tells it";
+  hosted.Refuse("");
+  expect(6, FrameStatus::PressAnalyze, [](auto&, StabilizerState& state) { KeepTable(state, {}); });
+  expect(6, FrameStatus::TrackingFailed,
+         [](StabilizerEffect& effect, auto&) { effect.MarkAnalysisFailed(); });
 }
 
-// What Analyze makes: a state of its own, whose analysis waits for the next tick.
 TEST(StabilizerEffectTest, AnalyzeStartsAnewAndDropsWhatWasSolved) {
-  StabilizerHost test;
-  test.Analysed(ShakenTable(20, 40));
-  test.TickUntilSolved();
-  ASSERT_TRUE(test.state()->warper);
-  HX_ParamChangedExtra analyze{kAnalyzeIndex};
-  ASSERT_EQ(test.Call(HX_CMD_PARAM_CHANGED, nullptr, &analyze), HX_ERR_NONE);
-  EXPECT_FALSE(test.state()->warper);
-  EXPECT_TRUE(test.state()->analyzer);
-  EXPECT_TRUE(test.Effect().IsBusy());
-  EXPECT_EQ(test.Status(), 4);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), FrameStatus::AnalysisInProgress);
-  EXPECT_EQ(test.opaque_uses, 1);
+  HostedEffect hosted(SmallClip("analysed again", 10));
+  hosted.Place(0, 8);
+  ASSERT_EQ(hosted.Analyse(), 8);
+  hosted.Place(0, 10);
+  hosted.Tick();
+  EXPECT_FALSE(hosted.Warp(3).empty());
+  ASSERT_TRUE(hosted.Press(kAnalyze).ok());
+  EXPECT_EQ(hosted.Status(), 4);
+  EXPECT_TRUE(hosted.Warp(3).empty());
+  hosted.stages().Take();
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
+  EXPECT_FALSE(hosted.Warp(9).empty());
 }
 
 TEST(StabilizerEffectTest, NoMemoryForTheHandle) {
-  StabilizerHost test;
-  test.host.ForgetOperations();
-  test.host.FailOperation(1);
-  EXPECT_EQ(test.Call(HX_CMD_CREATE_INSTANCE), HX_ERR_NO_INSTANCE);
-  EXPECT_EQ(test.host.operations().front().name, "new_handle");
-  EXPECT_STREQ(test.host.out.return_msg, "Not enough memory to allocate stabilizer data.");
-  EXPECT_EQ(test.host.in.instance_handle, nullptr);
+  HostedEffect hosted(SmallClip());
+  Operations::Get().FailNth(1, "new_handle");
+  EXPECT_EQ(hosted.Apply().creation().code, HX_ERR_NO_INSTANCE);
+  EXPECT_EQ(hosted.Messages().at(0), "Not enough memory to allocate stabilizer data.");
 }
 
-TEST(StabilizerEffectTest, AOneByOneSourceKeepsNoState) {
-  StabilizerHost test;
-  test.host.in.width = test.host.in.height = 1;
-  ASSERT_EQ(test.Call(HX_CMD_CREATE_INSTANCE), HX_ERR_NONE);
-  EXPECT_NE(test.host.in.instance_handle, nullptr);
-  EXPECT_EQ(test.state(), nullptr);
-  EXPECT_EQ(test.opaque_uses, 0);
-  for (const std::int32_t index : {1, 2, 17}) {
-    HX_ParamChangedExtra changed{index};
-    EXPECT_EQ(test.Call(HX_CMD_PARAM_CHANGED, nullptr, &changed), HX_ERR_NONE);
+// A renderer's instance takes over what runs, and leaves it alone.
+TEST(StabilizerEffectTest, RenderersComeAndGoDuringAnAnalysis) {
+  HostedEffect hosted(SmallClip());
+  hosted.Apply();
+  hosted.HoldAtFrame(6);
+  hosted.TickUntilHeld();
+  EXPECT_TRUE(hosted.effect().MakeRenderer()->Planned({0}).pixels);
+  EXPECT_EQ(hosted.Status(), 4);
+  EXPECT_EQ(hosted.Info().first, "") << "nothing was cancelled";
+  hosted.Release();
+  EXPECT_EQ(hosted.Settle(), 8);
+}
+
+TEST(StabilizerEffectTest, AnOutsideRendererDrawsWhatIsSolvedAndWaitsForWhatIsNot) {
+  HostedEffect hosted(SmallClip());
+  ASSERT_EQ(hosted.Analyse(), 8);
+  EXPECT_TRUE(hosted.AllowsOutside());
+  hosted.HoldSolve();
+  hosted.Set(kSmoothness, 20);
+  hosted.TickUntilHeld();
+  EXPECT_FALSE(hosted.AllowsOutside());
+  hosted.Release();
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_TRUE(hosted.AllowsOutside());
+  hosted.Inside([](StabilizerEffect& effect) {
+    KeepCrop(*effect.GetState(), {});
+    effect.PublishSharedData();
+  });
+  EXPECT_FALSE(hosted.AllowsOutside()) << "nothing to crop by";
+  hosted.Set(kFraming, 1);
+  hosted.Tick();
+  EXPECT_TRUE(hosted.AllowsOutside());
+}
+
+// The clip comes while nobody has a block yet: each of the renders makes one, and one is kept.
+TEST(StabilizerEffectTest, RendersThatAttachAtOnceShareOneBlock) {
+  HostedEffect hosted(ShakyClip{1, 1, 4, "one pixel"});
+  hosted.Apply();
+  for (int round = 0; round < 20; ++round) {
+    hosted.layer().Resize(1, 1);
+    std::vector<std::unique_ptr<Renderer>> renderers;
+    for (int i = 0; i < 4; ++i) renderers.push_back(hosted.effect().MakeRenderer());
+    hosted.layer().Resize(96, 64);
+    {
+      std::vector<std::jthread> threads;
+      for (const auto& renderer : renderers) {
+        threads.emplace_back([&] { EXPECT_TRUE(renderer->Planned({2}).pixels); });
+      }
+    }
+    EXPECT_EQ(hosted.host().opaque_data().uses(), 4u);
+    renderers.clear();
+    EXPECT_EQ(hosted.host().opaque_data().uses(), 0u);
   }
-  EXPECT_EQ(test.Call(HX_CMD_REFRESH_PARAMS), HX_ERR_NONE);
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_EQ(test.state(), nullptr);
 }
 
 }  // namespace
-}  // namespace kelp::effect
+}  // namespace calmframe::host

@@ -1,24 +1,16 @@
 #include <gtest/gtest.h>
 
-#include <boost/make_shared.hpp>
 #include <cstring>
+#include <string>
 
 #include "platform/tessel/debug.h"
-#include "stabilizer/effect/src/instance_handle.h"
-#include "tests/stabilizer/effect/stabilizer_host.h"
+#include "stabilizer/effect/src/stabilizer_effect.h"
+#include "tests/support/hosted_effect.h"
 
-// Flattened and restored instances, through the plug-in's entry.
-namespace kelp::effect {
+// What projects keep of an effect. That another process goes on from there, and shows the same
+// frames, is asked of the plug-in in tests/contract.
+namespace calmframe::host {
 namespace {
-
-// A handle of the host's with these bytes, as the host-in's instance.
-void Restore(StabilizerHost& test, const std::string& bytes) {
-  HX_Handle handle = test.host.in.cb->new_handle(bytes.size());
-  std::memcpy(test.host.in.cb->lock_handle(handle), bytes.data(), bytes.size());
-  test.host.in.cb->unlock_handle(handle);
-  test.host.in.instance_handle = handle;
-  EXPECT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
-}
 
 // Little-endian: version, flags, slot, payload length, and 7 bytes that nobody uses.
 std::string FlatHandle(std::uint32_t version, std::uint64_t length, const std::string& payload) {
@@ -31,186 +23,142 @@ std::string FlatHandle(std::uint32_t version, std::uint64_t length, const std::s
   return bytes;
 }
 
-std::string Flatten(StabilizerHost& test) {
-  EXPECT_EQ(test.Call(HX_CMD_FLATTEN_INSTANCE), HX_ERR_NONE);
-  return test.host.handle_bytes(test.host.in.instance_handle);
+std::string BytesOf(const SavedEffect& saved) {
+  return {saved.instance.begin(), saved.instance.end()};
 }
 
-std::string FlattenAndRestore(StabilizerHost& test) {
-  std::string bytes = Flatten(test);
-  EXPECT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
-  return bytes;
+SavedEffect WithBytes(SavedEffect saved, const std::string& bytes) {
+  saved.instance.assign(bytes.begin(), bytes.end());
+  return saved;
 }
 
-// Solved by a Solver, with a crop.
-StabilizerState& SolveFor(StabilizerHost& test, Framing framing = Framing::crop) {
-  test.Set(kFramingIndex, static_cast<int>(framing));
-  test.Analysed(ShakenTable(20, 40));
-  test.TickUntilSolved();
-  return *test.state();
-}
+class StoredServiceTest : public ::testing::Test {
+ protected:
+  void Solve(int framing) {
+    hosted.Apply();
+    hosted.Set(kFraming, framing);
+    ASSERT_EQ(hosted.Settle(), 8);
+    hosted.stages().Take();
+  }
+  std::string RunsFor(std::int32_t index, double value) {
+    EXPECT_TRUE(hosted.Set(index, value).ok());
+    EXPECT_EQ(hosted.Settle(), 8);
+    return hosted.stages().Take();
+  }
+  // The effect's, after it was loaded where it stands.
+  SavedEffect SaveInTheMiddle() {
+    const std::jthread release = hosted.ReleaseSoon();  // a save waits for the solve to stop
+    return hosted.Save();
+  }
 
-TEST(StoredServiceTest, ASolvedInstanceComesBackBitForBit) {
-  for (const Framing framing : {Framing::crop, Framing::synthesize_edges}) {
-    StabilizerHost test;
-    test.prefers_raw = true;
-    const auto warper = SolveFor(test, framing).warper;
-    const auto crop = test.state()->crop;
-    EXPECT_EQ(crop != nullptr, framing == Framing::crop);
-    const std::string bytes = FlattenAndRestore(test);
-    StabilizerState& back = *test.state();
-    ASSERT_TRUE(back.warper);
-    EXPECT_NE(back.warper, warper);
-    for (int f = 0; f < 20; ++f) {
-      EXPECT_TRUE(back.warper->frameWarp(f)->values == warper->frameWarp(f)->values) << f;
-    }
-    EXPECT_EQ(back.warper->frameMap()->entries(), warper->frameMap()->entries());
-    EXPECT_EQ(back.warper->frameMap()->entries().empty(), framing == Framing::crop);
-    ASSERT_EQ(back.crop != nullptr, crop != nullptr);
-    if (crop) {
-      EXPECT_EQ(std::memcmp(back.crop->rects.data(), crop->rects.data(), 20 * sizeof(crop_rect)),
-                0);
-    }
-    EXPECT_EQ(test.opaque_uses, 1);
+  HostedEffect hosted{SmallClip(), {.keeps_analysis_raw = true}};
+};
 
-    // Nothing is done again.
-    for (int i = 0; i < 3; ++i) {
-      EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-      EXPECT_FALSE(back.solver);
-    }
-    EXPECT_EQ(test.Effect().GetStatusForFrame(3), analysis::FrameStatus::Ready);
-    EXPECT_TRUE(FlattenAndRestore(test) == bytes);
-
+TEST_F(StoredServiceTest, ASolvedEffectComesBackBitForBitAndHasNothingToDo) {
+  for (const int framing : {2, 4}) {
+    Solve(framing);
+    const SavedEffect saved = hosted.Save();
+    const std::vector<double> warp = hosted.Warp(3);
+    hosted.Open(saved);
+    EXPECT_EQ(hosted.Warp(3), warp);
+    EXPECT_EQ(hosted.Settle(), 8);
+    EXPECT_EQ(hosted.stages().Take(), "");
+    const SavedEffect again = hosted.Save();
+    EXPECT_TRUE(again.instance == saved.instance);
+    EXPECT_EQ(again.values, saved.values) << "not even the counter";
     // A wider map needs tracks, and so does another path.
-    const bool edges = framing == Framing::synthesize_edges;
-    test.Set(edges ? kSynthesisInputRangeIndex : kSmoothnessIndex, edges ? 0.7 : 20);
-    EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-    ASSERT_TRUE(test.state()->solver);
-    EXPECT_FALSE(test.state()->solver->warper_supplied());
-    test.TickUntilSolved();
-    EXPECT_EQ(test.state()->phase, SolvePhase::Solved);
+    const bool edges = framing == 4;
+    EXPECT_EQ(RunsFor(edges ? kSynthesisInputRange : kSmoothness, edges ? 0.7 : 20),
+              edges ? "factorization " : "factorization crop ");
+    hosted.Remove();
   }
 }
 
-TEST(StoredServiceTest, AFramingAloneIsMadeFromTheStoredWarps) {
-  StabilizerHost test;
-  SolveFor(test, Framing::stabilize_only);
-  FlattenAndRestore(test);
-  test.Set(kFramingIndex, static_cast<int>(Framing::crop));
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  ASSERT_TRUE(test.state()->solver);
-  EXPECT_TRUE(test.state()->solver->warper_supplied());
+TEST_F(StoredServiceTest, TheHeaderOfWhatIsSaved) {
+  Solve(3);
+  const std::string bytes = BytesOf(hosted.Save());
+  std::uint64_t words[3];
+  std::memcpy(words, bytes.data(), sizeof words);
+  EXPECT_EQ(words[0], 16 + (std::uint64_t{1} << 32) + (std::uint64_t{1} << 40));  // flattened, raw
+  EXPECT_EQ(words[1], 0u) << "no address";
+  EXPECT_EQ(words[2], bytes.size() - 31);
+}
 
+TEST_F(StoredServiceTest, AFramingAloneIsMadeFromTheStoredWarps) {
+  Solve(1);
+  hosted.Reopen();
+  const std::vector<double> warp = hosted.Warp(3);
+  hosted.HoldSolve("Begin - RunCropper()");
+  hosted.Set(kFraming, 2);
+  hosted.TickUntilHeld();
   // Saved in the middle of it, it begins anew and keeps what it had.
-  FlattenAndRestore(test);
-  EXPECT_TRUE(test.state()->warper);
-  EXPECT_FALSE(test.state()->crop);
-  EXPECT_FALSE(test.state()->needs_solve);
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  ASSERT_TRUE(test.state()->solver);
-  EXPECT_TRUE(test.state()->solver->warper_supplied());
-  test.TickUntilSolved();
-  EXPECT_TRUE(test.state()->crop);
+  const SavedEffect middle = SaveInTheMiddle();
+  hosted.stages().Take();
+  hosted.Open(middle);
+  EXPECT_EQ(hosted.Warp(3), warp);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "crop ");
 }
 
-TEST(StoredServiceTest, SavedInTheMiddleOfASolveItSolves) {
-  StabilizerHost test;
-  test.Analysed(ShakenTable(20, 40));
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  ASSERT_TRUE(test.state()->solver);
-  FlattenAndRestore(test);
-  EXPECT_FALSE(test.state()->solver);
-  EXPECT_TRUE(test.state()->needs_solve);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::SubsequentSolve);
-  test.TickUntilSolved();
-  EXPECT_EQ(test.Status(), 8);
-
+TEST_F(StoredServiceTest, SavedInTheMiddleOfASolveItSolves) {
+  hosted.Apply();
+  hosted.HoldSolve();
+  hosted.TickUntilHeld();
+  hosted.Open(SaveInTheMiddle());
+  EXPECT_TRUE(hosted.Warp(3).empty());
+  hosted.stages().Take();
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
   // A later one: what was solved stays until the new results are there.
-  test.Set(kSmoothnessIndex, 10);
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  ASSERT_TRUE(test.state()->solver);
-  FlattenAndRestore(test);
-  EXPECT_TRUE(test.state()->warper);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::Ready);
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  ASSERT_TRUE(test.state()->solver);
-  EXPECT_FALSE(test.state()->solver->warper_supplied());
+  const std::vector<double> warp = hosted.Warp(3);
+  hosted.HoldSolve();
+  hosted.Set(kSmoothness, 10);
+  hosted.TickUntilHeld();
+  hosted.Open(SaveInTheMiddle());
+  hosted.stages().Take();
+  EXPECT_EQ(hosted.Warp(3), warp);
+  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
+  EXPECT_NE(hosted.Warp(3), warp);
 }
 
-TEST(StoredServiceTest, AnAnalysisThatHasNotBegunBeginsAfterTheReload) {
-  StabilizerHost test;
-  ASSERT_EQ(test.Call(HX_CMD_CREATE_INSTANCE), HX_ERR_NONE);
-  const analysis::AnalyzerRecord record = test.state()->analyzer->record();
-  FlattenAndRestore(test);
-  ASSERT_TRUE(test.state()->analyzer);
-  EXPECT_EQ(test.state()->analyzer->job_stage(), analysis::JobStage::NotStarted);
-  EXPECT_EQ(test.state()->analyzer->record().job_guid, record.job_guid);
-  EXPECT_EQ(test.state()->analyzer->GetTrackerGuid(), record.tracker_guid);
-  EXPECT_FALSE(test.state()->first_analysis);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::AnalysisInProgress);
-
-  // One whose job is not of this process is gone, and the host hears of it.
-  test.state()->analyzer->set_job_stage(analysis::JobStage::SeenRunning);
-  test.Set(kAnalysisStatusCounterIndex, 204);
-  FlattenAndRestore(test);
-  EXPECT_FALSE(test.state()->analyzer);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::PressAnalyze);
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_EQ(test.Status(), 1);
-  EXPECT_TRUE(test.Enabled(kAnalyzeIndex));
-}
-
-TEST(StoredServiceTest, OptionsAndTheHostDecideWhetherItIsDeflated) {
-  StabilizerHost test;
-  SolveFor(test);
-  const auto set = [](bool always, bool never) {
-    tessel::debug::DebugDatabase::Set("AnalysisDataIsAlwaysCompressed", always);
-    tessel::debug::DebugDatabase::Set("AnalysisDataIsNeverCompressed", never);
-  };
-  const struct {
-    bool always, never, prefers_raw;
-    char raw;
-  } cases[] = {{false, false, false, 0},
-               {false, false, true, 1},
-               {false, true, false, 1},
-               {true, true, true, 0},
-               {true, false, true, 0}};
-  std::size_t sizes[2] = {};
-  for (const auto& c : cases) {
-    set(c.always, c.never);
-    test.prefers_raw = c.prefers_raw;
-    const std::string bytes = FlattenAndRestore(test);
-    EXPECT_EQ(bytes[5], c.raw);
-    EXPECT_TRUE(test.state()->warper);
-    sizes[static_cast<int>(c.raw)] = bytes.size();
+TEST(StoredCompressionTest, OptionsAndTheHostDecideWhetherItIsDeflated) {
+  for (const bool prefers_raw : {false, true}) {
+    HostedEffect hosted(SmallClip(), {.keeps_analysis_raw = prefers_raw});
+    ASSERT_EQ(hosted.Analyse(), 8);
+    std::size_t sizes[2] = {};
+    for (const auto& [always, never] : {std::pair{true, true}, {true, false}, {false, true}}) {
+      tessel::debug::DebugDatabase::Set("AnalysisDataIsAlwaysCompressed", always);
+      tessel::debug::DebugDatabase::Set("AnalysisDataIsNeverCompressed", never);
+      const std::string bytes = BytesOf(hosted.Save());
+      EXPECT_EQ(bytes[5], always ? 0 : 1);
+      sizes[static_cast<int>(bytes[5])] = bytes.size();
+    }
+    EXPECT_LT(sizes[0], sizes[1] / 2);
+    tessel::debug::DebugDatabase::Set("AnalysisDataIsNeverCompressed", false);
+    EXPECT_EQ(BytesOf(hosted.Save())[5], prefers_raw ? 1 : 0);
+    EXPECT_FALSE(hosted.Warp(3).empty());
   }
-  set(false, false);
-  EXPECT_LT(sizes[0], sizes[1] / 4);
 }
 
-TEST(StoredServiceTest, WhatCannotBeReadBecomesAnEmptyStateAndAMessage) {
-  std::string good;
-  {
-    StabilizerHost test;
-    test.prefers_raw = true;
-    SolveFor(test);
-    good = Flatten(test);
-  }
+TEST_F(StoredServiceTest, WhatCannotBeReadIsToldAndWaitsForAnalyze) {
+  Solve(2);
+  const SavedEffect saved = hosted.Save();
+  const std::string good = BytesOf(saved);
   const std::size_t mesh = good.find("hseM");
   std::string bad_marker = good, other_grid = good, deflated_12 = good;
   bad_marker[mesh] = 'H';
   ++other_grid[mesh + 4];
   deflated_12[0] = 12;  // whose payloads are deflated whatever the flag says
-  const std::string damaged = "Calmframe requires re-analysis because saved data has been damaged.";
+  const std::string again = "Calmframe requires re-analysis because ";
+  const std::string damaged = again + "saved data has been damaged.";
   const struct {
     std::string bytes;
     std::string message;
-    std::int32_t width = 640;
+    int width = 96;
   } cases[] = {
-      {FlatHandle(2, 0, ""),
-       "Calmframe requires re-analysis because the project data is from an old version."},
-      {FlatHandle(17, 0, ""),
-       "Calmframe requires re-analysis because the project data is from a newer version."},
+      {FlatHandle(2, 0, ""), again + "the project data is from an old version."},
+      {FlatHandle(17, 0, ""), again + "the project data is from a newer version."},
       {FlatHandle(16, 4, "????"), damaged},
       {FlatHandle(16, std::uint64_t{1} << 40, ""), damaged},
       {std::string(10, '\1'), damaged},
@@ -220,60 +168,77 @@ TEST(StoredServiceTest, WhatCannotBeReadBecomesAnEmptyStateAndAMessage) {
       {other_grid, "Calmframe requires re-analysis because of an old project format."},
       {good,
        "Calmframe for layer \u201cClip 1\u201d requires re-analysis because the source dimensions "
-       "have changed from 640x360 to 320x360.",
-       320},
+       "have changed from 96x64 to 50x64.",
+       50},
   };
+  hosted.layer().Change([](LayerState& state) { state.name = "Clip 1"; });
   for (const auto& c : cases) {
-    StabilizerHost test;
-    test.host.in.width = c.width;
-    test.Set(kAnalysisStatusCounterIndex, 508);
-    Restore(test, c.bytes);
-    EXPECT_TRUE(test.host.ShowsMessage());
-    EXPECT_EQ(std::string(test.host.out.return_msg), c.message);
-    ASSERT_NE(test.state(), nullptr);
-    EXPECT_FALSE(test.state()->warper);
-    EXPECT_FALSE(test.state()->has_frames());
-    EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::PressAnalyze);
-    EXPECT_EQ(test.opaque_uses, 1);
-    EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-    EXPECT_EQ(test.Status(), 1);
+    hosted.layer().Resize(c.width, 64);
+    hosted.Open(WithBytes(saved, c.bytes));
+    EXPECT_EQ(hosted.Messages(), std::vector<std::string>{c.message});
+    EXPECT_EQ(hosted.Settle(), 1) << c.message;
+    EXPECT_TRUE(hosted.Warp(3).empty());
+    EXPECT_TRUE(hosted.Enabled(kAnalyze));
   }
+  hosted.layer().Resize(96, 64);
+  EXPECT_TRUE(hosted.Press(kAnalyze).ok());
+  EXPECT_EQ(hosted.Settle(), 8);
 }
 
 // What an instance without a layer leaves: nothing to read, and no state until Analyze makes one.
-TEST(StoredServiceTest, AnEmptyPayloadLeavesNoState) {
-  StabilizerHost test;
-  Restore(test, FlatHandle(16, 0, ""));
-  EXPECT_EQ(test.state(), nullptr);
-  EXPECT_FALSE(test.host.ShowsMessage());
-  EXPECT_EQ(test.opaque_uses, 0);
-  EXPECT_EQ(test.Tick(), HX_ERR_NONE);
-  EXPECT_EQ(test.Effect().GetStatusForFrame(0), analysis::FrameStatus::PressAnalyze);
-  EXPECT_EQ(test.Call(HX_CMD_REFRESH_PARAMS), HX_ERR_NONE);
-  EXPECT_EQ(Flatten(test).size(), 31u);
-  EXPECT_EQ(test.Call(HX_CMD_RESTORE_INSTANCE), HX_ERR_NONE);
-  HX_ParamChangedExtra analyze{kAnalyzeIndex};
-  EXPECT_EQ(test.Call(HX_CMD_PARAM_CHANGED, nullptr, &analyze), HX_ERR_NONE);
-  ASSERT_NE(test.state(), nullptr);
-  EXPECT_TRUE(test.state()->analyzer);
-  EXPECT_EQ(test.opaque_uses, 1);
+TEST_F(StoredServiceTest, AnEmptyPayloadLeavesNoState) {
+  Solve(3);
+  const SavedEffect saved = hosted.Save();
+  hosted.Open(WithBytes(saved, FlatHandle(16, 0, "")));
+  EXPECT_TRUE(hosted.Messages().empty());
+  EXPECT_TRUE(hosted.Tick().ok());
+  hosted.Inside([](kelp::effect::StabilizerEffect& effect) {
+    EXPECT_EQ(effect.GetState(), nullptr);
+    EXPECT_EQ(effect.GetStatusForFrame(0), kelp::analysis::FrameStatus::PressAnalyze);
+  });
+  EXPECT_EQ(hosted.Save().instance.size(), 31u);
+  EXPECT_TRUE(hosted.Press(kAnalyze).ok());
+  EXPECT_EQ(hosted.Settle(), 8);
 }
 
-TEST(StoredServiceTest, ARestoreThatFailsKeepsTheBytes) {
-  StabilizerHost test;
-  SolveFor(test);
-  const std::string bytes = Flatten(test);
-  for (int n = 1;; ++n) {
-    ASSERT_LT(n, 100) << "no end of host calls";
-    test.host.FailOperation(n);
-    const HX_Err code = test.Call(HX_CMD_RESTORE_INSTANCE);
-    test.host.FailOperation(0);
-    if (code == HX_ERR_NONE || test.state()) break;
-    EXPECT_TRUE(test.host.handle_bytes(test.host.in.instance_handle) == bytes) << n;
+// An analysis that ran in another process is gone with it, and the host hears of it; what fits is
+// not told again.
+TEST_F(StoredServiceTest, TheCounterOfAProjectIsSetRight) {
+  Solve(3);
+  SavedEffect saved = hosted.Save();
+  for (const auto& [told, status] : {std::pair{504.0, 8}, {506.0, 8}, {508.0, 8}}) {
+    saved.values[Session::kStatusDiskId] = told;
+    hosted.Open(saved);
+    EXPECT_EQ(hosted.Status(), status);
+    EXPECT_EQ(hosted.Value(kStatusCounter) > 600, told != 508) << told;
   }
-  ASSERT_TRUE(test.state());
-  EXPECT_TRUE(test.state()->warper);
+  saved.values[Session::kStatusDiskId] = 504;
+  hosted.Open(hosted.Altered(saved, [](kelp::effect::SavedState& state) {
+    state.phase = kelp::effect::SolvePhase::Failed;
+    KeepWarps(state, {});
+  }));
+  EXPECT_EQ(hosted.Status(), 10);
+}
+
+// Whatever fails in a save or the load behind it, the effect has what it had.
+TEST_F(StoredServiceTest, AFailingSaveLosesNothing) {
+  Solve(3);
+  const std::vector<double> warp = hosted.Warp(3);
+  const auto names = HostedEffect::OperationsOf([this] { hosted.Save(); });
+  hosted.stages().Take();
+  int failures = 0;
+  for (std::size_t n = 1; n <= names.size(); ++n) {
+    Operations::Get().FailNth(static_cast<std::int64_t>(n));
+    SavedEffect saved;
+    failures += !hosted.effect().Save(&saved).ok();
+    Operations::Get().FailNone();
+    EXPECT_TRUE(hosted.Tick().ok()) << names[n - 1];
+    EXPECT_EQ(hosted.Warp(3), warp) << names[n - 1];
+    EXPECT_EQ(hosted.Settle(), 8) << names[n - 1];
+  }
+  EXPECT_GT(failures, 10);
+  EXPECT_EQ(hosted.stages().Take(), "");
 }
 
 }  // namespace
-}  // namespace kelp::effect
+}  // namespace calmframe::host

@@ -1,79 +1,106 @@
 #include <gtest/gtest.h>
 
-#include "tests/stabilizer/effect/render_service_fixture.h"
+#include <filesystem>
+#include <optional>
 
-namespace kelp::effect {
+#include "effect/parameter_row.h"
+#include "platform/tesselui/save_dialog.h"
+#include "tests/stabilizer/effect/shifted_clip.h"
+#include "tests/support/scratch_folder.h"
+
+namespace calmframe::host {
 namespace {
 
 constexpr double kDot = 3.14 * 5.3 * 5.3;  // pixels that a dot touches
 
 // A solved clip of two frames whose one track is at (20, 20) and (24, 23), shown with its tracks.
-class TrackOverlayTest : public RenderServiceTest {
+class ExperimentalTrackOverlayTest : public ShiftedClipTest {
  protected:
-  TrackOverlayTest() {
-    test.Solved(ShiftingWarper(kWidth, kHeight, {{0, 0}, {10, 6}}), {});
-    test.Set(kShowTracksIndex, 1);
-    SetFraming(Framing::stabilize_only);
-    test.RenderCopy();
+  void SetUp() override {
+    if (!kelp::effect::ShowsExperimentalParameters()) GTEST_SKIP();
+    Load(kelp::effect::ShiftingWarper(kWidth, kHeight, {{0, 0}, {10, 6}}),
+         {{kFraming, 1}, {kShowTracks, 1}}, Ramp, [](kelp::effect::SavedState& state) {
+           marrow::tracking::AllFeatures table;
+           table.frame_count = 2;
+           table.feature_count = 1;
+           *table.features = {{20, 20, 1, 1}, {24, 23, 0, 1}};
+           KeepTable(state, table);
+         });
   }
-  HX_Err RenderDirect(TestWorld& output) {
-    EXPECT_EQ(test.Call(HX_CMD_PREPARE_FRAME), HX_ERR_NONE);
-    EXPECT_EQ(test.host.out.width, kWidth) << "the input's own size";
-    return test.Call(HX_CMD_RENDER_FRAME, output.get());
-  }
-  // Pixels that are not the source's.
-  int Changed(const TestWorld& world) const {
+  // Pixels of a whole frame that are not the source's.
+  static int Changed(const WorldBuffer& pixels) {
+    EXPECT_EQ(Sides(pixels.rect()), (std::vector<int>{0, 0, kWidth, kHeight}));
     int changed = 0;
     for (int y = 0; y < kHeight; ++y) {
-      for (int x = 0; x < kWidth; ++x) {
-        changed += std::abs(world.At(x, y, 1) - source_.At(x, y, 1)) > 0.01;
-      }
+      for (int x = 0; x < kWidth; ++x)
+        changed += std::abs(ChannelAt(pixels, x, y, 1) - x / 100.0) > 0.01;
     }
     return changed;
   }
 };
 
-TEST_F(TrackOverlayTest, BothPathsAndPartsShowTheInputWithItsTracksAtEveryDepth) {
-  for (const std::int32_t depth : {8, 16, 32}) {
-    UseDepth(depth);
-    ASSERT_EQ(test.Plan({0, 0, kWidth, kHeight}, depth), HX_ERR_NONE);
-    EXPECT_EQ(test.orders.size(), 1u);
-    TestWorld planned(kWidth, kHeight, depth), part(20, 14, depth, 15, 12);
-    ASSERT_EQ(test.RenderPlan(planned, depth), HX_ERR_NONE);
-    EXPECT_NEAR(Changed(planned), kDot, 8) << "one dot, nothing stabilized";
-    ASSERT_EQ(test.RenderPlan(part, depth), HX_ERR_NONE);
-    for (int y = 0; y < 14; ++y) {
-      for (int x = 0; x < 20; ++x) {
+TEST_F(ExperimentalTrackOverlayTest, BothPathsAndPartsShowTheInputWithItsTracksAtEveryDepth) {
+  EXPECT_EQ(OrdersOf(1), 1u);
+  for (const int depth : {8, 16, 32}) {
+    const auto whole = DrawBoth({1, depth});
+    EXPECT_NEAR(Changed(*whole), kDot, 8) << "one dot, nothing stabilized";
+    RenderRequest request{1, depth};
+    request.part = HX_Rect{15, 12, 35, 26};
+    const auto part = DrawBoth(request);
+    for (int y = 12; y < 26; ++y) {
+      for (int x = 15; x < 35; ++x) {
         for (int c = 0; c < 4; ++c) {
-          ASSERT_EQ(part.At(x, y, c), planned.At(x + 15, y + 12, c)) << x << " " << y;
+          ASSERT_EQ(ChannelAt(*part, x, y, c), ChannelAt(*whole, x, y, c)) << x << " " << y;
         }
       }
     }
-    if (depth == 32) continue;
-    TestWorld direct(kWidth, kHeight, depth);
-    ASSERT_EQ(RenderDirect(direct), HX_ERR_NONE);
-    EXPECT_TRUE(direct == planned);
   }
 }
 
-TEST_F(TrackOverlayTest, ShownWhileADeletionIsSolvedAndNotOutsideTheRange) {
-  TestWorld output(kWidth, kHeight, 8);
-  auto& contents = test.state()->shared->contents;
-  contents.needs_solve = contents.subsequent_solve = true;
-  ASSERT_EQ(RenderDirect(output), HX_ERR_NONE);
-  EXPECT_NEAR(Changed(output), kDot, 8) << "the tracks, and no banner over them";
-  contents.subsequent_solve = false;
-  test.Set(kHideWarningBannerIndex, 1);
-  ASSERT_EQ(RenderDirect(output), HX_ERR_NONE);
-  EXPECT_EQ(Changed(output), 0);
-  contents.needs_solve = false;
-  test.layer.start = 2;  // the clip's third frame
-  ASSERT_EQ(RenderDirect(output), HX_ERR_NONE);
-  EXPECT_EQ(Changed(output), 0);
-  test.layer.start = 0;
-  ASSERT_EQ(RenderDirect(output), HX_ERR_NONE);
-  EXPECT_NEAR(Changed(output), kDot, 8);
+TEST_F(ExperimentalTrackOverlayTest, ShownWhileADeletionIsSolvedAndNotOutsideTheRange) {
+  const auto mark = [this](bool needs_solve, bool on_deletion) {
+    hosted().Inside([=](kelp::effect::StabilizerEffect& effect) {
+      effect.GetState()->needs_solve = needs_solve;
+      effect.GetState()->subsequent_solve = on_deletion;
+      effect.PublishSharedData();
+    });
+  };
+  mark(true, true);
+  EXPECT_NEAR(Changed(*DrawBoth({1})), kDot, 8) << "the tracks, and no banner over them";
+  hosted().Set(kHideBanner, 1);
+  mark(true, false);
+  EXPECT_EQ(Changed(*DrawBoth({1})), 0);
+  mark(false, false);
+  EXPECT_NEAR(Changed(*DrawBoth({1})), kDot, 8);
+  hosted().Place(1, 1);
+  hosted().Inside([](kelp::effect::StabilizerEffect& effect) {
+    auto table = TableOf(*effect.GetState());
+    table.first_frame = 3;
+    KeepTable(*effect.GetState(), table);
+    effect.PublishSharedData();
+  });
+  EXPECT_EQ(Changed(*DrawBoth({0})), 0);
+}
+
+// The third button of the experts.
+TEST_F(ExperimentalTrackOverlayTest, TheSaveButtonWritesTheTracksWhereTheUserSays) {
+  const ScratchFolder folder;
+  const std::string path = folder.In("clip.trk");
+  tesselui::InstallSaveDialog([&](const tesselui::SaveDialogRequest& request) {
+    EXPECT_EQ(request.filter, "TRK Files (*.trk)");
+    EXPECT_EQ(request.default_extension, "trk");
+    return std::optional<std::string>(path);
+  });
+  EXPECT_TRUE(hosted().Press(kSaveTracks).ok());
+  EXPECT_EQ(std::filesystem::file_size(path), 20u + 16 * 2);
+  EXPECT_TRUE(hosted().Enabled(kSaveTracks));
+  std::filesystem::remove(path);
+
+  tesselui::InstallSaveDialog({});  // a cancel
+  EXPECT_TRUE(hosted().Press(kSaveTracks).ok());
+  EXPECT_TRUE(hosted().Enabled(kSaveTracks));
+  EXPECT_FALSE(std::filesystem::exists(path));
 }
 
 }  // namespace
-}  // namespace kelp::effect
+}  // namespace calmframe::host
