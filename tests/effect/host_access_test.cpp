@@ -110,6 +110,16 @@ TEST_F(HostAccessTest, RefusalsAreTheHostsCodes) {
   }
 }
 
+TEST_F(HostAccessTest, AFrameThatWasNotPlannedIsNotCheckedIn) {
+  HX_RenderExtra render{};
+  render.checkout_layer_pixels = [](HX_EffectRef, std::int32_t, HX_World**) -> HX_Err {
+    return 88;
+  };
+  HostContext context = context_;
+  context.extra = &render;
+  EXPECT_EQ(Thrown([&] { PlannedLayer layer(context, 6); }), 88);
+}
+
 TEST_F(HostAccessTest, ReportsNameTheFrameAndFailQuietly) {
   ReportOutOfMemoryOnFrame(context_, 12);
   EXPECT_EQ(TakeMessage(), "Calmframe out of memory on frame 12.");

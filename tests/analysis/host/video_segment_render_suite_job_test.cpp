@@ -235,24 +235,6 @@ TEST_F(VideoSegmentRenderSuiteJobTest, WhatIsStillWantedAtTheEndIsCancelledAndMa
   End();  // the callbacks come when the job is gone
 }
 
-TEST_F(VideoSegmentRenderSuiteJobTest, ACancelLetsTheWaitEndByItsDelivery) {
-  on_draw_ = [this](std::int64_t) {
-    drawing_.Signal();
-    held_[0].Wait();
-  };
-  Start([this] {
-    Request(1);
-    Fetch(0);
-    if (job_->GetStatus().state >= JobState::Cancelled) throw analysis::TerminateException();
-    ADD_FAILURE() << "the cancel was not seen";
-  });
-  drawing_.Wait();
-  job_->Cancel();
-  held_[0].Signal();
-  tessel::threads::Shutdown();
-  EXPECT_TRUE(job_->WasCancelled());
-}
-
 // All that its next fetch asks for is there, and the host draws many frames meanwhile.
 TEST_F(VideoSegmentRenderSuiteJobTest, RestsWhileTheHostPauses) {
   CompletionEvent begun, go_on;
@@ -366,15 +348,7 @@ TEST_F(VideoSegmentRenderSuiteJobTest, MediaWithoutASizeIsNotBegun) {
   }
 }
 
-TEST_F(VideoSegmentRenderSuiteJobTest, WithoutASuiteOrTheMediaThereIsNoJob) {
-  for (const std::string suite : {HX_CUTPIX_SUITE, HX_CUTPIX_CACHE_SUITE, HX_SEQUENCE_INFO_SUITE,
-                                  HX_VIDEO_SEGMENT_SUITE, HX_VIDEO_SEGMENT_RENDER_SUITE,
-                                  HX_PRIVATE_EFFECT_SUITE, HX_UTILITY_SUITE, HX_STRING_SUITE}) {
-    Operations::Get().FailNth(1, "acquire " + suite);
-    EXPECT_THROW(Make(), std::int32_t) << suite;
-    EXPECT_EQ(TakeMessage(), "Not able to acquire OVK Suite.");
-    EXPECT_EQ(calmframe::host::Ledger::Get().Report(), "");
-  }
+TEST_F(VideoSegmentRenderSuiteJobTest, WithoutTheMediaThereIsNoJob) {
   host_->media().faults.node_missing = true;  // nothing stands under the layer
   EXPECT_THROW(Make(), tessel::config::Error);
   host_->media().faults.node_missing = false;

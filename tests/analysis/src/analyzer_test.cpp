@@ -27,16 +27,16 @@ class AnalyzerTest : public calmframe::host::HostRecords {
     EXPECT_EQ(FakeJob::living, 0);
   }
 
+  void OnCall(FakeJob& job, const std::string& call) {
+    if (call != stop_at_) return;
+    if (fail_) fail_(job);
+    reached_.Signal();
+    release_.Wait();
+  }
   JobFactory Factory() {
-    return [this](HX_InData*, HX_OutData*, const JobInput& input,
-                  const boost::shared_ptr<Analysis>& analysis) {
-      const auto job = boost::make_shared<FakeJob>(input, analysis,
-                                                   [this](FakeJob& self, const std::string& call) {
-                                                     if (call != stop_at_) return;
-                                                     if (fail_) fail_(self);
-                                                     reached_.Signal();
-                                                     release_.Wait();
-                                                   });
+    return [this](HX_InData*, HX_OutData*, const JobInput& input, const auto& analysis) {
+      const auto job = boost::make_shared<FakeJob>(
+          input, analysis, [this](FakeJob& self, auto& call) { OnCall(self, call); });
       jobs_.push_back(job);
       return job;
     };
@@ -58,7 +58,7 @@ class AnalyzerTest : public calmframe::host::HostRecords {
 
   std::vector<boost::weak_ptr<FakeJob>> jobs_;
   std::string stop_at_;                 // the call at which jobs wait
-  std::function<void(FakeJob&)> fail_;  // or do this
+  std::function<void(FakeJob&)> fail_;  // or do this instead
   CompletionEvent reached_, release_;
 };
 
