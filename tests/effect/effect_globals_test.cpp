@@ -30,12 +30,7 @@ class EffectGlobalsTest : public calmframe::host::HostRecords {
     literals_ = std::move(literals);
     literals_.push_back(nullptr);
     strings_ = {static_cast<std::uint32_t>(literals_.size()), 4700, literals_.data()};
-    try {
-      OpenPlugin(context_, strings_);
-      return HX_ERR_NONE;
-    } catch (std::int32_t code) {
-      return code;
-    }
+    return Thrown([this] { OpenPlugin(context_, strings_); });
   }
   std::string About() {
     ShowAboutText(context_);

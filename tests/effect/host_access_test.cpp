@@ -18,16 +18,6 @@ using calmframe::host::Operations;
 
 constexpr char kNoSuite[] = "Not able to acquire OVK Suite.";
 
-// The code that was thrown, 0 if none.
-HX_Err Thrown(const std::function<void()>& body) {
-  try {
-    body();
-    return 0;
-  } catch (std::int32_t code) {
-    return code;
-  }
-}
-
 class HostAccessTest : public calmframe::host::HostRecords {
  protected:
   const HostContext context_ = RecordsOnly(&in_, &out_);

@@ -68,6 +68,15 @@ class HostRecords : public testing::Test {
     });
   }
 
+  // The code that was thrown, 0 if none.
+  static HX_Err Thrown(const std::function<void()>& body) {
+    try {
+      body();
+      return HX_ERR_NONE;
+    } catch (std::int32_t code) {
+      return code;
+    }
+  }
   // What was shown since the last look.
   std::string TakeMessage() {
     const bool shown = out_.out_flags & HX_OUT_FLAG_SHOW_MESSAGE;

@@ -103,13 +103,6 @@ TEST_F(AnalysisTest, FieldsCountAsFramesAndAlternate) {
   EXPECT_TRUE(IdenticalTimes(run.duration, {1, 50}));
 }
 
-template <class T>
-T At(const std::string& bytes, std::size_t offset) {
-  T value;
-  std::memcpy(&value, bytes.data() + offset, sizeof value);
-  return value;
-}
-
 TEST_F(AnalysisTest, DumpsEveryTrackBeforeShortOnesGo) {
   const ScratchFolder folder;
   setenv("TMPDIR", folder.path().c_str(), 1);
@@ -117,37 +110,41 @@ TEST_F(AnalysisTest, DumpsEveryTrackBeforeShortOnesGo) {
   marrow::tracking::TrackerParams tracker = SmallTracker();
   tracker.kill_tracks_shorter_than = 100;
   TableOf(ClipInput(3), false, tracker);
-  std::string bytes = folder.Content("OVAnalysis_unquantized.trk");
-  ASSERT_EQ(bytes.size(), 20u + 3 * 8 * 16);
-  EXPECT_EQ(bytes.substr(0, 8), "\xf5\xff\xff\xff\xff\xff\xff\xff");
-  EXPECT_EQ(At<std::int32_t>(bytes, 8), 0);
-  EXPECT_EQ(At<std::int32_t>(bytes, 12), 3);
-  EXPECT_EQ(At<std::int32_t>(bytes, 16), 8);
-  const Cell& first = analysis_->all_features().features->front();
-  EXPECT_EQ(At<std::int32_t>(bytes, 20 + 8), 1);  // a seed; removed from the table since
+  const auto dumped = [&folder] {
+    std::string bytes = folder.Content("OVAnalysis_unquantized.trk");
+    // -11, the rows' first and end, the features of a row
+    const std::string head("\xf5\xff\xff\xff\xff\xff\xff\xff\0\0\0\0\3\0\0\0\10\0\0\0", 20);
+    EXPECT_EQ(bytes.substr(0, 20), head);
+    EXPECT_EQ(bytes.size(), 20u + 3 * 8 * 16);
+    bytes.resize(20 + 3 * 8 * 16);
+    std::vector<Cell> cells(3 * 8);
+    std::memcpy(cells.data(), bytes.data() + 20, 3 * 8 * 16);
+    return cells;
+  };
+  const Cell first = analysis_->all_features().features->front();
+  EXPECT_EQ(dumped()[0].status, 1);  // a seed; removed from the table since
+  EXPECT_EQ(dumped()[0].y, first.y);
   EXPECT_EQ(first.status, -4);
-  EXPECT_EQ(At<float>(bytes, 20 + 4), first.y);
 
   // Of a run from frame 2 only the last row is reached; two are missing.
   TableOf(ClipInput(3, 2));
-  bytes = folder.Content("OVAnalysis_unquantized.trk");
-  ASSERT_EQ(bytes.size(), 20u + 3 * 8 * 16);
-  EXPECT_EQ(At<float>(bytes, 20), (*analysis_->all_features().features)[2 * 8].x);
+  const std::vector<Cell> cells = dumped();
+  EXPECT_EQ(cells[0].x, (*analysis_->all_features().features)[2 * 8].x);
   for (int cell = 8; cell < 24; ++cell) {
-    EXPECT_EQ(At<float>(bytes, 20 + 16 * cell), 0);
-    EXPECT_EQ(At<std::int32_t>(bytes, 20 + 16 * cell + 8), -1);
+    EXPECT_EQ(cells[cell].x, 0);
+    EXPECT_EQ(cells[cell].status, -1);
   }
   tessel::debug::DebugDatabase::Set("WriteAnalysisServerTrackFile", 0);
   unsetenv("TMPDIR");
 
-  const std::vector<Cell> cells(1500);
+  const std::vector<Cell> many(1500);
   const std::string trk = folder.In("a.trk");
-  EXPECT_EQ(WriteTrackFile(trk, cells.data(), 1500, 0, 3, 500), TrackFileResult::Written);
+  EXPECT_EQ(WriteTrackFile(trk, many.data(), 1500, 0, 3, 500), TrackFileResult::Written);
   EXPECT_EQ(std::filesystem::file_size(trk), 24020u);
   EXPECT_EQ(WriteTrackFile(trk, nullptr, 0, 0, 0, 0), TrackFileResult::Written);
   EXPECT_EQ(std::filesystem::file_size(trk), 20u);
   EXPECT_EQ(WriteTrackFile(folder.In("no/a.trk"), nullptr, 0, 0, 0, 0), TrackFileResult::NotOpened);
-  EXPECT_NE(WriteTrackFile("/dev/full", cells.data(), 1500, 0, 3, 500), TrackFileResult::Written);
+  EXPECT_NE(WriteTrackFile("/dev/full", many.data(), 1500, 0, 3, 500), TrackFileResult::Written);
 }
 
 }  // namespace
