@@ -1,5 +1,4 @@
 #include "effect/entry.h"
-#include "effect/host_text.h"
 
 namespace {
 
@@ -7,7 +6,7 @@ class ProbeEffect final : public kelp::effect::GenericEffect {
  public:
   explicit ProbeEffect(const kelp::effect::HostContext& context) noexcept
       : GenericEffect(context) {}
-  void ShowAbout() override { kelp::effect::ShowMessage(context(), "about"); }
+  void ShowAbout() override { context().out->version = 1234; }
   void ReportOutOfMemory() override {}
   void ReportUnknownException() override {}
   HX_Err AddParam(std::int32_t) override { return HX_ERR_NONE; }

@@ -2,77 +2,104 @@
 
 #include <gmock/gmock.h>
 
+#include <atomic>
 #include <boost/make_shared.hpp>
 #include <functional>
-#include <memory>
+#include <new>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
 
 #include "analysis/src/analysis.h"
+#include "analysis/src/identities.h"
 #include "platform/tessel/config.h"
-#include "platform/tessel/threads.h"
-#include "tests/analysis/host/fake_renderer.h"
-#include "tests/analysis/src/fake_host.h"
-#include "tests/effect/fake_host.h"
+#include "platform/tessel/importer.h"
+#include "tests/effect/host_records.h"
 
 namespace kelp {
 namespace {
 
-using analysis::JobInput;
 using analysis::JobState;
 using analysis::RationalTime;
+using calmframe::host::LayerState;
+using calmframe::host::Operations;
+using calmframe::host::Picture;
+using tessel::threads::CompletionEvent;
 using ::testing::ElementsAre;
-using ::testing::IsEmpty;
+using Job = VideoSegmentRenderSuiteJob;
+using Body = std::function<void()>;
 
-constexpr int kWidth = 24, kHeight = 10;
+std::uint8_t Grey(std::int64_t frame, int x, int y) {
+  return static_cast<std::uint8_t>(20 * frame + 7 * x + 3 * y);
+}
+
+// What the tables that stand in for the host's do beside what those do.
+std::vector<std::pair<std::int64_t, HX_RenderParams>> renders;
+std::int64_t rate_ticks = 0;
+std::string changed_key, changed_value;  // a property of the media; absent for an empty value
+std::function<void()> on_lookup;
+struct Delivered {
+  std::int32_t width, height;
+  std::uint32_t format;
+} delivered;
 
 // A job over a clip of no length, whose body is the test's own.
-class VideoSegmentRenderSuiteJobTest : public ::testing::Test {
+class VideoSegmentRenderSuiteJobTest : public calmframe::host::HostRecords {
  protected:
-  VideoSegmentRenderSuiteJobTest() {
-    for (const auto& suite : analysis::FakeHost::SuiteTables()) {
-      if (suite.name != HX_PRIVATE_EFFECT_SUITE) {
-        host_.Offer(suite.name, suite.version, suite.table);
-      }
-    }
-    layer_.count = 10;
-    layer_.top = layer_.AddPlainClip("media");
-    Media().properties = {{HX_PROPERTY_STREAM_WIDTH, std::to_string(kWidth)},
-                          {HX_PROPERTY_STREAM_HEIGHT, std::to_string(kHeight)},
-                          {HX_PROPERTY_STREAM_PAR_NUM, "16"},
-                          {HX_PROPERTY_STREAM_PAR_DEN, "15"}};
-    renderer_ = std::make_unique<FakeRenderer>(host_);
+  VideoSegmentRenderSuiteJobTest()
+      : HostRecords([this](std::int64_t frame, Picture& picture) {
+          on_draw_(frame);
+          calmframe::host::FillPicture(picture, [frame](int x, int y) {
+            const float grey = Grey(frame, x, y) / 255.0f;
+            return HX_PixelFloat{1, grey, grey, grey};
+          });
+        }) {
+    host_->media().SetCacheBytes(0);
+    host_->media().faults.row_padding = 8;
     input_.FieldType = 0;
     input_.StepTime = {1, 25};
   }
-  ~VideoSegmentRenderSuiteJobTest() override {
+  void TearDown() override {
+    for (CompletionEvent& held : held_) held.Signal();
     End();
-    renderer_->Stop();
-    EXPECT_EQ(renderer_->Leaks(), "");
-    EXPECT_EQ(host_.Leaks(), "");
-    renderer_.reset();
+    HostRecords::TearDown();
   }
 
-  analysis::FakeHost::Node& Media() { return layer_.nodes[0]; }
   // The job is gone, and its thread.
   void End() {
     job_.reset();
     tessel::threads::Shutdown();
   }
-  VideoSegmentRenderSuiteJob& Make() {
-    job_ = boost::make_shared<VideoSegmentRenderSuiteJob>(
-        &host_.in, &host_.out, input_,
+  Job& Make() {
+    job_ = boost::make_shared<Job>(
+        &in_, &out_, input_,
         boost::make_shared<analysis::Analysis>(marrow::tracking::SelectorParams(),
                                                marrow::tracking::TrackerParams()));
     return *job_;
   }
-  // The body in the background; the state it ends in.
-  JobState Run(std::function<void()> body) {
-    Make();
-    job_->AddRunFunction([body](analysis::Job&) { body(); });
+  void Start(const Body& body) {
+    Make().AddRunFunction([body](analysis::Job&) { body(); });
     job_->Start(job_);
+  }
+  // The state that the body, in the background, ends in.
+  JobState Run(const Body& body) {
+    Start(body);
     tessel::threads::Shutdown();
+    Operations::Get().FailNone();
     return job_->GetStatus().state;
   }
+  // What the body's whole run asks the host for.
+  std::multiset<std::string> OperationsOf(const Body& body) {
+    Operations::Get().Record(true);
+    Run(body);
+    Operations::Get().Record(false);
+    const std::vector<std::string> names = Operations::Get().recorded();
+    return {names.begin(), names.end()};
+  }
+
   RationalTime At(int frame) const { return input_.StepTime * frame; }
+  bool Request(int frame) { return job_->RequestFrame(At(frame), 0); }
   struct Frame {
     std::int32_t row_bytes = 0;
     bool flipped = false;
@@ -84,173 +111,272 @@ class VideoSegmentRenderSuiteJobTest : public ::testing::Test {
     job_->GetFrame(At(frame), 0, &f.row_bytes, &f.flipped, &f.format, &f.pixels);
     return f;
   }
+  void Fetch(int frame) {
+    Request(frame);
+    Get(frame);
+  }
 
-  analysis::FakeHost layer_;
-  ::FakeHost host_;
-  std::unique_ptr<FakeRenderer> renderer_;
-  JobInput input_;
-  boost::shared_ptr<VideoSegmentRenderSuiteJob> job_;
+  analysis::JobInput input_;
+  boost::shared_ptr<Job> job_;
+  std::function<void(std::int64_t frame)> on_draw_ = [](std::int64_t) {};
+  // For on_draw_, which may be called until the end: draws go on; one has begun.
+  CompletionEvent held_[3], drawing_;
 };
 
 TEST_F(VideoSegmentRenderSuiteJobTest, AFrameThatSeveralAskForIsRenderedOnceAndReadInPlace) {
-  for (const auto callbacks : {FakeRenderer::Callbacks::kLater, FakeRenderer::Callbacks::kEarly}) {
-    renderer_->callbacks = callbacks;
-    renderer_->top_down = callbacks == FakeRenderer::Callbacks::kEarly;
-    const std::size_t before = renderer_->requests().size();
-    const JobState end = Run([&] {
+  for (const bool early : {false, true}) {
+    host_->media().faults.early_callback = early;
+    host_->media().faults.bottom_up = early;
+    const auto body = [&] {
       std::int32_t width = 0, height = 0;
       job_->GetFrameSize(&width, &height);
       EXPECT_EQ(width, kWidth);
       EXPECT_EQ(height, kHeight);
-      for (int reader = 0; reader < 3; ++reader) job_->RequestFrame(At(4), 0);
+      for (int reader = 0; reader < 3; ++reader) Request(4);
       const Frame f = Get(4);
-      EXPECT_TRUE(job_->RequestFrame(At(4), 0));  // in the cache by now
+      EXPECT_TRUE(Request(4));  // in the cache by now
       EXPECT_EQ(f.row_bytes, kWidth * 4 + 8);
-      EXPECT_EQ(f.flipped, !renderer_->top_down);
-      const int row = renderer_->top_down ? 7 : kHeight - 1 - 7;
+      EXPECT_EQ(f.flipped, early);
+      const int row = early ? kHeight - 1 - 7 : 7;
       for (int x = 0; x < kWidth; ++x) {
-        EXPECT_EQ(f.pixels[f.row_bytes * row + 4 * x + 1],
-                  FakeRenderer::Grey(4 * 28224000LL, x, 7));
+        EXPECT_EQ(f.pixels[f.row_bytes * row + 4 * x + 1], Grey(4, x, 7));
       }
       for (int reader = 0; reader < 3; ++reader) job_->ReleaseFrame(At(4), 0);
       EXPECT_EQ(Get(4).pixels, f.pixels);  // the last reference is still there
-    });
-    EXPECT_EQ(end, JobState::Finished);
-    EXPECT_EQ(renderer_->requests().size(), before + 1);
+    };
+    const auto operations = OperationsOf(body);
+    EXPECT_EQ(operations.count("Video Segment Render.RenderAsync"), 1u);
+    EXPECT_EQ(operations.count("Video Segment Render.Cancel"), 0u);
+    EXPECT_EQ(job_->GetStatus().state, JobState::Finished);
   }
-  EXPECT_GE(host_.rerenders(), 4);
 }
 
 TEST_F(VideoSegmentRenderSuiteJobTest, RequestsTellTheHostTimesInTicksAndFields) {
-  layer_.ticks = renderer_->ticks_per_frame = 23543520;  // 30000/1001 a second
+  layer_->Change([](LayerState& layer) {
+    layer.ticks_per_frame = 23543520;  // of 30000/1001
+    layer.field_type = 1;
+  });
   input_.StepTime = {1001, 30000};
   input_.FieldType = 1;
+  static const auto host = TableOf<HX_VideoSegmentRenderSuite3>(HX_VIDEO_SEGMENT_RENDER_SUITE, 3);
+  static HX_VideoSegmentRenderSuite3 table = host;
+  table.RenderAsync = [](HX_Node node, std::int64_t time, std::int64_t rate,
+                         const HX_RenderParams* params, HX_RenderCallback callback, void* record,
+                         std::int32_t* id) {
+    renders.push_back({time, *params});
+    rate_ticks = rate;
+    return host.RenderAsync(node, time, rate, params, callback, record, id);
+  };
+  Replace(HX_VIDEO_SEGMENT_RENDER_SUITE, &table);
+  renders.clear();
   EXPECT_EQ(Run([&] {
-              const RationalTime half = input_.StepTime / 2 * 3;
-              job_->RequestFrame(half, 0);
+              job_->RequestFrame(input_.StepTime / 2 * 3, 0);
               job_->RequestFrame(At(1), 2);
             }),
             JobState::Finished);
-  const auto requests = renderer_->requests();
-  ASSERT_EQ(requests.size(), 2u);
-  EXPECT_EQ(requests[0].time_ticks, 35315280);  // 1.5 * 23543520
-  EXPECT_EQ(requests[0].rate_ticks, 23543520);
-  EXPECT_EQ(requests[0].params.field_selection, 1);
-  EXPECT_EQ(requests[1].params.field_type, 2);
-  EXPECT_EQ(requests[1].params.field_selection, 0);
-  const HX_RenderParams& p = requests[0].params;
-  EXPECT_EQ(p.format_count, 1);
-  EXPECT_THAT((std::vector<int>{p.width, p.height, p.par_num, p.par_den, p.quality, p.field_type,
-                                p.final_value}),
-              ElementsAre(kWidth, kHeight, 16, 15, 3, 0, 3));
+  End();
+  ASSERT_EQ(renders.size(), 2u);
+  EXPECT_EQ(renders[0].first, 35315280);  // 1.5 * 23543520
+  EXPECT_EQ(rate_ticks, 23543520);
+  EXPECT_EQ(renders[1].second.field_type, 2);
+  EXPECT_EQ(renders[1].second.field_selection, 0);
+  const HX_RenderParams& p = renders[0].second;
+  EXPECT_THAT((std::vector<int>{p.format_count, p.width, p.height, p.par_num, p.par_den, p.quality,
+                                p.field_type, p.field_selection, p.final_value}),
+              ElementsAre(1, kWidth, kHeight, 16, 15, 3, 0, 1, 3));
 }
 
-TEST_F(VideoSegmentRenderSuiteJobTest, ARenderWithoutAFrameEndsTheWaitAndFailsTheJob) {
-  renderer_->null_frames = true;
-  for (const auto callbacks : {FakeRenderer::Callbacks::kLater, FakeRenderer::Callbacks::kEarly}) {
-    renderer_->callbacks = callbacks;
-    EXPECT_EQ(Run([&] {
-                job_->RequestFrame(At(0), 0);
-                Get(0);
-              }),
-              JobState::Failed);
-    EXPECT_EQ(job_->GetErrorText(), VideoSegmentRenderSuiteJob::kNoFrame);
-  }
-  // Nobody asked for it: there is nothing to wait for.
-  EXPECT_EQ(Run([&] { Get(3); }), JobState::Failed);
-  // A frame of another size than the readers' images.
-  renderer_->null_frames = false;
-  renderer_->delivered_width = kWidth - 1;
+// A frame comes behind the one that was asked for after it, and both when the job has looked for
+// the first in vain.
+TEST_F(VideoSegmentRenderSuiteJobTest, EachFrameIsWaitedForWhateverElseComes) {
+  static const auto host = TableOf<HX_CutPixCacheSuite5>(HX_CUTPIX_CACHE_SUITE, 5);
+  static HX_CutPixCacheSuite5 table = host;
+  table.Lookup = [](const HX_Guid* identifier, HX_Frame* frame) {
+    const HX_Err code = host.Lookup(identifier, frame);
+    on_lookup();
+    return code;
+  };
+  Replace(HX_CUTPIX_CACHE_SUITE, &table);
+  static std::atomic<int> wanted, lookups;
+  on_lookup = [this] {
+    if (wanted < 0) return;
+    ++lookups;
+    held_[wanted].Signal();
+  };
+  on_draw_ = [this](std::int64_t frame) {
+    const std::int64_t first = frame / 2 * 2;
+    held_[first].Wait();
+    while (frame == first && host_->media().counts().requests > 1) std::this_thread::yield();
+    // Who doesn't wait looks again now.
+    for (int i = 0; i < 2000 && lookups < 2; ++i) std::this_thread::yield();
+  };
   EXPECT_EQ(Run([&] {
-              job_->RequestFrame(At(0), 0);
-              Get(0);
+              for (const int frame : {0, 2}) {
+                wanted = -1;
+                lookups = 0;
+                Request(frame);
+                Request(frame + 1);
+                wanted = frame;
+                Get(frame);
+              }
             }),
-            JobState::Failed);
+            JobState::Finished)
+      << job_->GetErrorText();
 }
 
 TEST_F(VideoSegmentRenderSuiteJobTest, WhatIsStillWantedAtTheEndIsCancelledAndMayComeLate) {
-  renderer_->callbacks = FakeRenderer::Callbacks::kHeld;
-  EXPECT_EQ(Run([&] {
-              job_->RequestFrame(At(0), 0);
-              job_->RequestFrame(At(1), 0);
-              EXPECT_TRUE(job_->RequestFrame(At(1), 0));  // on its way
-            }),
-            JobState::Finished);
-  EXPECT_EQ(renderer_->cancelled(), 2);
-  EXPECT_EQ(renderer_->requests().size(), 2u);
+  on_draw_ = [this](std::int64_t) { held_[0].Wait(); };
+  const auto body = [&] {
+    for (int frame = 0; frame < 3; ++frame) Request(frame);  // more than there are render threads
+    EXPECT_TRUE(Request(1));                                 // on its way
+  };
+  EXPECT_EQ(OperationsOf(body).count("Video Segment Render.Cancel"), 3u);
+  EXPECT_EQ(job_->GetStatus().state, JobState::Finished);
   End();  // the callbacks come when the job is gone
-  renderer_->Deliver();
 }
 
-TEST_F(VideoSegmentRenderSuiteJobTest, ACancelLetsTheWaitEndByItsDelivery) {
-  renderer_->callbacks = FakeRenderer::Callbacks::kHeld;
-  Make();
-  job_->AddRunFunction([this](analysis::Job&) {
-    job_->RequestFrame(At(0), 0);
-    job_->RequestFrame(At(1), 0);
-    Get(0);
-    if (job_->GetStatus().state >= JobState::Cancelled) throw analysis::TerminateException();
-    ADD_FAILURE() << "the cancel was not seen";
+// All that its next fetch asks for is there, and the host draws many frames meanwhile.
+TEST_F(VideoSegmentRenderSuiteJobTest, RestsWhileTheHostPauses) {
+  CompletionEvent begun, go_on;
+  std::atomic<bool> fetched = false;
+  on_draw_ = [this](std::int64_t frame) {
+    if (frame == kFrames - 1) drawing_.Signal();
+  };
+  Start([&] {
+    Fetch(0);
+    begun.Signal();
+    go_on.Wait();
+    for (int frame = 1; frame < kFrames; ++frame) Request(frame);
+    Get(1);
+    fetched = true;
+    drawing_.Wait();  // the end cancels what is not drawn
   });
-  job_->Start(job_);
-  renderer_->WaitForHeld(2);
-  job_->Cancel();
-  renderer_->Deliver();
+  begun.Wait();
+  tessel::importer::PauseBackgroundWork(true);
+  go_on.Signal();
+  drawing_.Wait();
+  EXPECT_FALSE(fetched);
+  tessel::importer::PauseBackgroundWork(false);
   tessel::threads::Shutdown();
-  EXPECT_TRUE(job_->WasCancelled());
+  EXPECT_TRUE(fetched);
+  EXPECT_EQ(job_->GetStatus().state, JobState::Finished);
+}
+
+TEST_F(VideoSegmentRenderSuiteJobTest, TheHostIsToldOfEachFetchAndOfTheEnd) {
+  constexpr char kNotice[] = "Private Effect.ForceRerender";
+  const auto fetch = [this] { Fetch(0); };
+  EXPECT_EQ(OperationsOf([] {}).count(kNotice), 1u);
+  EXPECT_EQ(OperationsOf(fetch).count(kNotice), 2u);
+  EXPECT_EQ(OperationsOf([] { throw std::bad_alloc(); }).count(kNotice), 1u);
+  EXPECT_EQ(job_->GetStatus().state, JobState::Failed);
 }
 
 TEST_F(VideoSegmentRenderSuiteJobTest, EveryRefusalOfTheHostHasItsText) {
-  const auto request = [&] { job_->RequestFrame(At(0), 0); };
-  renderer_->refuse_renders = true;
-  EXPECT_EQ(Run(request), JobState::Failed);
-  EXPECT_EQ(job_->GetErrorText(), VideoSegmentRenderSuiteJob::kNoRender);
-  renderer_->refuse_identifiers = true;
-  EXPECT_EQ(Run(request), JobState::Failed);
-  EXPECT_EQ(job_->GetErrorText(), VideoSegmentRenderSuiteJob::kNoFrameIdentifier);
-
-  bool ran = false;
-  const auto body = [&ran] { ran = true; };
-  for (const char* key : {HX_PROPERTY_STREAM_WIDTH, HX_PROPERTY_STREAM_PAR_DEN}) {
-    const auto properties = Media().properties;
-    Media().properties.erase(key);
-    EXPECT_EQ(Run(body), JobState::Failed);
-    EXPECT_EQ(job_->GetErrorText(), VideoSegmentRenderSuiteJob::kNoNodeProperty);
-    Media().properties = properties;
+  const std::pair<const char*, const char*> refusals[] = {
+      {"CutPix.GetPixels", Job::kNoFrame},
+      {"CutPix.GetRowBytes", Job::kNoFrame},
+      {"CutPix.GetPixelFormat", Job::kNoFrame},
+      {"CutPix.GetSize", Job::kNoFrame},
+      {"CutPix Cache.Lookup", Job::kNoFrame},
+      {"CutPix Cache.Reference", Job::kUnknownError},
+      {"Video Segment Render.RenderAsync", Job::kNoRender},
+      {"Video Segment Render.MakeIdentifier", Job::kNoFrameIdentifier},
+      {"String.GetUTF8", Job::kNoFrameIdentifier}};
+  for (const auto& [operation, text] : refusals) {
+    EXPECT_EQ(Run([this, name = operation] {
+                Operations::Get().FailAlways(name);
+                Fetch(0);
+              }),
+              JobState::Failed)
+        << operation;
+    EXPECT_EQ(job_->GetErrorText(), text) << operation;
   }
-  Media().properties[HX_PROPERTY_STREAM_HEIGHT] = "tall";
-  EXPECT_EQ(Run(body), JobState::Failed);
-  EXPECT_EQ(job_->GetErrorText(), VideoSegmentRenderSuiteJob::kNoNodeProperty);
-  EXPECT_FALSE(ran);
-  EXPECT_EQ(layer_.node_references, 0);  // the node went with the run
+  EXPECT_EQ(host_->media().counts().nodes, 0u);  // the media's went with the run
 }
 
-TEST_F(VideoSegmentRenderSuiteJobTest, WithoutASuiteOrTheMediaThereIsNoJob) {
-  for (const char* suite : {HX_CUTPIX_SUITE, HX_CUTPIX_CACHE_SUITE, HX_SEQUENCE_INFO_SUITE,
-                            HX_VIDEO_SEGMENT_SUITE, HX_VIDEO_SEGMENT_RENDER_SUITE,
-                            HX_PRIVATE_EFFECT_SUITE, HX_UTILITY_SUITE, HX_STRING_SUITE}) {
-    host_.Prepare();
-    host_.RefuseSuite(suite);
-    EXPECT_THROW(Make(), std::int32_t) << suite;
-    EXPECT_STREQ(host_.out.return_msg, "Not able to acquire OVK Suite.");
-    EXPECT_TRUE(host_.ShowsMessage());
-    host_.OfferAllSuites();
-    EXPECT_EQ(host_.Leaks(), "");
+TEST_F(VideoSegmentRenderSuiteJobTest, WithoutAFrameOfTheReadersSizeAndFormatTheJobFails) {
+  const auto fails = [this](const Body& body) {
+    EXPECT_EQ(Run(body), JobState::Failed);
+    EXPECT_EQ(job_->GetErrorText(), Job::kNoFrame);
+  };
+  fails([this] { Get(3); });  // nobody asked for it: there is nothing to wait for
+  for (const bool early : {false, true}) {
+    host_->media().faults.early_callback = early;
+    host_->media().faults.null_frame = true;
+    fails([this] { Fetch(0); });
   }
-  // Somebody else's effect stands on the clip; nothing stands under the layer.
-  layer_.runtime_id = 78;
+  host_->media().faults.null_frame = false;
+  static HX_CutPixSuite1 table = TableOf<HX_CutPixSuite1>(HX_CUTPIX_SUITE, 1);
+  table.GetSize = [](HX_Frame, std::int32_t* width, std::int32_t* height) -> HX_Err {
+    *width = delivered.width;
+    *height = delivered.height;
+    return HX_ERR_NONE;
+  };
+  table.GetPixelFormat = [](HX_Frame, std::uint32_t* format) -> HX_Err {
+    *format = delivered.format;
+    return HX_ERR_NONE;
+  };
+  Replace(HX_CUTPIX_SUITE, &table);
+  for (const Delivered frame : {Delivered{kWidth - 1, kHeight, HX_FORMAT_ARGB8},
+                                {kWidth, kHeight + 1, HX_FORMAT_ARGB8},
+                                {kWidth, kHeight, HX_FORMAT_ARGB16}}) {
+    delivered = frame;
+    fails([this] { Fetch(0); });
+  }
+}
+
+TEST_F(VideoSegmentRenderSuiteJobTest, MediaWithoutASizeIsNotBegun) {
+  static const auto host = TableOf<HX_VideoSegmentSuite5>(HX_VIDEO_SEGMENT_SUITE, 5);
+  static const auto strings = TableOf<HX_StringSuite1>(HX_STRING_SUITE, 1);
+  static HX_VideoSegmentSuite5 table = host;
+  table.GetProperty = [](HX_Node node, const char* key, HX_String* text) -> HX_Err {
+    if (key != changed_key) return host.GetProperty(node, key, text);
+    if (changed_value.empty()) return HX_ERR_UNKNOWN;
+    return strings.MakeFromUTF8(changed_value.c_str(), text);
+  };
+  Replace(HX_VIDEO_SEGMENT_SUITE, &table);
+  const std::pair<const char*, const char*> properties[] = {
+      {HX_PROPERTY_STREAM_WIDTH, ""},    {HX_PROPERTY_STREAM_HEIGHT, ""},
+      {HX_PROPERTY_STREAM_PAR_NUM, ""},  {HX_PROPERTY_STREAM_PAR_DEN, ""},
+      {HX_PROPERTY_STREAM_WIDTH, "-24"}, {HX_PROPERTY_STREAM_WIDTH, "4294967320"},
+      {HX_PROPERTY_STREAM_HEIGHT, "0"},  {HX_PROPERTY_STREAM_HEIGHT, "10 or so"}};
+  for (const auto& [key, value] : properties) {
+    changed_key = key;
+    changed_value = value;
+    EXPECT_EQ(Run([] { ADD_FAILURE() << "begun"; }), JobState::Failed);
+    EXPECT_EQ(job_->GetErrorText(), Job::kNoNodeProperty) << key << " " << value;
+  }
+}
+
+TEST_F(VideoSegmentRenderSuiteJobTest, WithoutTheMediaThereIsNoJob) {
+  host_->media().faults.node_missing = true;  // nothing stands under the layer
   EXPECT_THROW(Make(), tessel::config::Error);
-  layer_.runtime_id = 77;
-  layer_.top = -1;
+  host_->media().faults.node_missing = false;
+  const LayerState layer = *layer_->state();
+  layer_->Change([](LayerState& l) { l.effects = {{1000000, "somebody else's", "", {}}}; });
   EXPECT_THROW(Make(), tessel::config::Error);
+  layer_->Change([&](LayerState& l) {
+    l = layer;
+    l.effects.resize(1100, {1000000, "too deep above", "", {}});
+  });
+  EXPECT_THROW(Make(), std::int32_t);
 }
 
 TEST_F(VideoSegmentRenderSuiteJobTest, FramesComeFromTheInputOfTheEffectsOwnNode) {
-  // Another effect on the clip from above: the owner is found beneath it. Without properties the
-  // media beneath the wrong node would fail the job.
-  const int other = layer_.AddNode({"", "", {{HX_PROPERTY_RUNTIME_INSTANCE_ID, "5"}}, {}, {}});
-  layer_.top = layer_.AddNode({"", "", {}, {other}, {layer_.top}});
-  EXPECT_EQ(Run([] {}), JobState::Finished);
+  const auto fill = [](float grey) {
+    return [grey](std::int64_t, Picture& picture) {
+      calmframe::host::FillPicture(picture, [=](int, int) {
+        return HX_PixelFloat{1, grey, grey, grey};
+      });
+    };
+  };
+  layer_->InsertEffect(0, {calmframe::host::NewRuntimeId(), "below", "", fill(0.2f)});
+  layer_->InsertEffect(2, {calmframe::host::NewRuntimeId(), "above", "", fill(0.8f)});
+  EXPECT_EQ(Run([this] {
+              Request(0);
+              EXPECT_EQ(Get(0).pixels[1], 51);
+            }),
+            JobState::Finished);
 }
 
 }  // namespace

@@ -2,87 +2,77 @@
 
 #include <gmock/gmock.h>
 
-#include <cmath>
+#include <boost/make_shared.hpp>
+#include <new>
 
 #include "analysis/src/analysis_state.h"
 #include "analysis/src/identities.h"
 #include "platform/tessel/debug.h"
-#include "tests/analysis/src/fake_host.h"
 #include "tests/analysis/src/fake_job.h"
+#include "tests/effect/host_records.h"
 
 namespace kelp::analysis {
 namespace {
 
 using tessel::threads::CompletionEvent;
 
-class AnalyzerTest : public ::testing::Test {
+class AnalyzerTest : public calmframe::host::HostRecords {
  protected:
-  AnalyzerTest() {
-    host_.count = 3;
-    host_.top = host_.AddPlainClip("0a000000-0000-0000-0000-000000000001");
-    other_top_ = host_.AddPlainClip("0a000000-0000-0000-0000-000000000002");
-  }
-  ~AnalyzerTest() override {
+  AnalyzerTest() { Place(0, 3); }
+  void TearDown() override {
     release_.Signal();
     JobRegistry::Instance().CancelAll();
     jobs_.clear();
-    tessel::threads::Shutdown();
+    HostRecords::TearDown();
     EXPECT_EQ(FakeJob::living, 0);
   }
 
+  void OnCall(FakeJob& job, const std::string& call) {
+    if (call != stop_at_) return;
+    if (fail_) fail_(job);
+    reached_.Signal();
+    release_.Wait();
+  }
   JobFactory Factory() {
-    return [this](HX_InData*, HX_OutData*, const JobInput& input,
-                  const boost::shared_ptr<Analysis>& analysis) {
+    return [this](HX_InData*, HX_OutData*, const JobInput& input, const auto& analysis) {
       const auto job = boost::make_shared<FakeJob>(
-          input, analysis, [this](FakeJob& self, const std::string& call) {
-            if (call != stop_at_) return;
-            if (fail_) self.Fail("$$$/stabilizer/error/Test=Frame lost.");
-            reached_.Signal();
-            release_.Wait();
-          });
+          input, analysis, [this](FakeJob& self, auto& call) { OnCall(self, call); });
       jobs_.push_back(job);
       return job;
     };
   }
   boost::shared_ptr<AnalyzerPrem> Make(std::uint64_t slots = 8) {
-    auto selector = SmallSelector();
-    selector.max_count = slots;
-    return boost::make_shared<AnalyzerPrem>(&host_.in, &host_.out, selector, SmallTracker(),
+    return boost::make_shared<AnalyzerPrem>(&in_, &out_, SmallSelector(slots), SmallTracker(),
                                             Factory());
   }
   boost::shared_ptr<AnalyzerPrem> Started(std::uint64_t slots = 8) {
     const auto analyzer = Make(slots);
-    analyzer->Start(&host_.in, &host_.out);
+    analyzer->Start(&in_, &out_);
     return analyzer;
   }
-  void Stop(Analyzer& analyzer) { analyzer.Stop(&host_.in, &host_.out); }
-  void Cancel(Analyzer& analyzer) {
-    analyzer.Cancel(&host_.in, &host_.out, "");
-    Stop(analyzer);
-  }
+  void Stop(Analyzer& analyzer) { analyzer.Stop(&in_, &out_); }
   // The job of this number, counted in the order of making, with its run at an end.
   void WaitForJob(std::size_t number) {
     if (const auto job = jobs_.at(number).lock()) WaitFor(*job);
   }
 
-  FakeHost host_;
-  int other_top_ = 0;
   std::vector<boost::weak_ptr<FakeJob>> jobs_;
-  std::string stop_at_;  // the call at which jobs wait
-  bool fail_ = false;    // or fail
+  std::string stop_at_;                 // the call at which jobs wait
+  std::function<void(FakeJob&)> fail_;  // or do this instead
   CompletionEvent reached_, release_;
 };
 
 TEST_F(AnalyzerTest, RunsToItsResultsAndLeavesNothing) {
-  host_.start = 7;
+  Place(7, 3);
   const auto analyzer = Make();
   EXPECT_FALSE(analyzer->IsActive());
   EXPECT_EQ(analyzer->GetStatus().state, JobState::Failed);
-  EXPECT_FALSE(analyzer->ReportFailure(&host_.in, &host_.out) && host_.out.out_flags != 0);
+  EXPECT_TRUE(analyzer->ReportFailure(&in_, &out_));
+  EXPECT_EQ(TakeMessage(), "");
   EXPECT_EQ(analyzer->FirstFrame(), 7);
   EXPECT_EQ(analyzer->EndFrame(), 10);
   stop_at_ = "get 1";
-  analyzer->Start(&host_.in, &host_.out);
+  analyzer->Start(&in_, &out_);
   EXPECT_EQ(analyzer->job_stage(), JobStage::Started);
   reached_.Wait();
   EXPECT_TRUE(analyzer->IsActive());
@@ -110,10 +100,10 @@ TEST_F(AnalyzerTest, EqualInputSharesOneJobWhateverItsParameters) {
   EXPECT_EQ(second->GetTrackerGuid(), GetIdentifierForTracker(SmallSelector(), SmallTracker()));
 
   // Other timing and another source are other jobs.
-  host_.count = 4;
+  Place(0, 4);
   const auto longer = Started();
-  host_.count = 3;
-  host_.top = other_top_;
+  Place(0, 3);
+  layer_->InsertEffect(0, {calmframe::host::NewRuntimeId(), "blur", "", {}});
   const auto elsewhere = Started();
   EXPECT_EQ(jobs_.size(), 3u);
   release_.Signal();
@@ -123,11 +113,11 @@ TEST_F(AnalyzerTest, EqualInputSharesOneJobWhateverItsParameters) {
   EXPECT_EQ(longer->GetFeatures()->frame_count, 4);
 
   // One that cancels takes the job from the other as well.
-  Cancel(*first);
+  first->Cancel(&in_, &out_, "");
+  Stop(*first);
   EXPECT_EQ(second->GetStatus().state, JobState::Failed);
-  EXPECT_TRUE(second->ReportFailure(&host_.in, &host_.out));
-  EXPECT_STREQ(host_.out.return_msg, "");
-  Cancel(*second);
+  EXPECT_TRUE(second->ReportFailure(&in_, &out_));
+  EXPECT_EQ(TakeMessage(), "");
   EXPECT_TRUE(longer->GetFeatures());
 }
 
@@ -151,38 +141,40 @@ TEST_F(AnalyzerTest, AFinishedJobWaitsForLateJoinersThatWantTheSame) {
   tessel::threads::Shutdown();        // runs the delayed removal
   EXPECT_TRUE(jobs_[0].expired());
   EXPECT_TRUE(other->GetFeatures());
-  Stop(*other);
 }
 
 TEST_F(AnalyzerTest, CancelledJobsHaveNoResultsAndAreNeverJoined) {
   stop_at_ = "get 1";
   const auto first = Started();
   reached_.Wait();
-  first->Cancel(&host_.in, &host_.out, "text");
+  first->Cancel(&in_, &out_, "text");
   EXPECT_FALSE(first->IsActive());
   const auto second = Started();
   EXPECT_EQ(jobs_.size(), 2u);
+  second->Cancel(&in_, &out_, "text");
   release_.Signal();
-  tessel::threads::Shutdown();
-  EXPECT_EQ(first->GetFeatures(), nullptr);
-  EXPECT_TRUE(second->GetFeatures());
+  tessel::threads::Shutdown();  // both are finished
+  EXPECT_EQ(second->GetFeatures(), nullptr);
+  const auto third = Started();
+  EXPECT_EQ(jobs_.size(), 3u);
+  WaitForJob(2);
   Stop(*first);
-  EXPECT_TRUE(second->GetFeatures());
+  Stop(*second);
+  EXPECT_TRUE(third->GetFeatures());
 }
 
 TEST_F(AnalyzerTest, AFailureIsToldOnceAndRetried) {
   stop_at_ = "get 2";
-  fail_ = true;
+  fail_ = [](FakeJob& job) { job.Fail("$$$/stabilizer/error/Test=Frame lost."); };
   const auto analyzer = Started();
   WaitForJob(0);
   EXPECT_EQ(analyzer->GetStatus().state, JobState::Failed);
-  EXPECT_TRUE(analyzer->ReportFailure(&host_.in, &host_.out));
-  EXPECT_STREQ(host_.out.return_msg, "Frame lost.");
-  EXPECT_EQ(host_.out.out_flags, 0x100u);
+  EXPECT_TRUE(analyzer->ReportFailure(&in_, &out_));
+  EXPECT_EQ(TakeMessage(), "Frame lost.");
   EXPECT_EQ(analyzer->GetFeatures(), nullptr);
   analyzer->set_job_stage(JobStage::SeenEnded);
   Stop(*analyzer);  // the entry lingers
-  fail_ = false;
+  fail_ = {};
   release_.Signal();
   const auto again = Started();
   ASSERT_EQ(jobs_.size(), 2u);
@@ -190,25 +182,41 @@ TEST_F(AnalyzerTest, AFailureIsToldOnceAndRetried) {
   EXPECT_TRUE(again->GetFeatures());
 }
 
-TEST_F(AnalyzerTest, StoppedWhileRunningItsJobEndsAlone) {
+TEST_F(AnalyzerTest, AJobThatCannotStartIsNeverJoined) {
+  stop_at_ = "start";
+  fail_ = [](FakeJob&) { throw std::bad_alloc(); };
+  EXPECT_THROW(Started(), std::bad_alloc);
+  EXPECT_TRUE(jobs_[0].expired());
+}
+
+TEST_F(AnalyzerTest, ANewAnalysisOfTheStateEndsTheOldOne) {
+  Place(7, 3);
   stop_at_ = "get 1";
   AnalysisState state;
-  state.Begin(&host_.in, &host_.out, SmallSelector(), SmallTracker(), true, Factory());
-  EXPECT_TRUE(bool(state.detailed == true));
-  state.analyzer->Start(&host_.in, &host_.out);
+  const auto begin = [&](bool detailed) {
+    state.Begin(&in_, &out_, SmallSelector(), SmallTracker(), detailed, Factory());
+    EXPECT_EQ(bool{state.detailed}, detailed);
+    state.analyzer->Start(&in_, &out_);
+  };
+  begin(true);
   reached_.Wait();
-  // A new one ends the old one first.
-  state.Begin(&host_.in, &host_.out, SmallSelector(), SmallTracker(), false, Factory());
-  state.analyzer->Start(&host_.in, &host_.out);
-  EXPECT_EQ(jobs_.size(), 2u);
+  state.error_text = "of the old one";
+  state.progress.remaining_seconds = 7;
+  begin(false);
+  ASSERT_EQ(jobs_.size(), 2u);
+  EXPECT_TRUE(jobs_[0].lock()->WasCancelled());
+  EXPECT_EQ(state.error_text, "");
+  EXPECT_EQ(state.progress.remaining_seconds, 0);
   release_.Signal();
   tessel::threads::Shutdown();
   EXPECT_TRUE(jobs_[0].expired());
   EXPECT_TRUE(state.TakeResults());
   EXPECT_EQ(state.all_features.frame_count, 3);
+  EXPECT_EQ(state.first_frame, 7);
+  EXPECT_EQ(state.tracker_identity, GetIdentifierForTracker(SmallSelector(), SmallTracker()));
   EXPECT_EQ(GetIdentifierForJobInput(state.job_input), state.analyzer->record().job_guid);
   EXPECT_FALSE(state.result_identity.IsNil());
-  state.EndAnalyzer(&host_.in, &host_.out);
+  state.EndAnalyzer(&in_, &out_);
   EXPECT_TRUE(jobs_[1].expired());
   EXPECT_FALSE(state.TakeResults());
   EXPECT_EQ(state.all_features.frame_count, 3);
@@ -225,16 +233,20 @@ TEST_F(AnalyzerTest, AReloadedAnalyzerFindsItsJobAgain) {
   AnalyzerPrem reloaded(record, source, Factory());
   EXPECT_TRUE(reloaded.CanGoOn());
   EXPECT_TRUE(reloaded.IsActive());
+  AnalyzerRecord changed = record;
+  changed.job_stage = JobStage::NotStarted;
+  EXPECT_FALSE(AnalyzerPrem(changed, source, Factory()).IsActive());
+  changed = record;
+  changed.tracker_guid = {};
+  EXPECT_FALSE(AnalyzerPrem(changed, source, Factory()).CanGoOn());
   release_.Signal();
   WaitForJob(0);
   EXPECT_TRUE(reloaded.CanGoOn());
   EXPECT_EQ(reloaded.GetFeatures()->frame_count, 3);
-  AnalyzerPrem of_other_parameters(record, source, Factory());
   Stop(reloaded);
-  EXPECT_FALSE(of_other_parameters.CanGoOn());
-  AnalyzerRecord fresh = record;
-  fresh.job_stage = JobStage::NotStarted;
-  EXPECT_TRUE(AnalyzerPrem(fresh, {}, Factory()).CanGoOn());
+  EXPECT_FALSE(AnalyzerPrem(record, source, Factory()).CanGoOn());
+  changed.job_stage = JobStage::NotStarted;
+  EXPECT_TRUE(AnalyzerPrem(changed, {}, Factory()).CanGoOn());
 }
 
 TEST_F(AnalyzerTest, LogsItsParametersAsNumbers) {

@@ -2,53 +2,38 @@
 
 #include <gmock/gmock.h>
 
-#include <cmath>
-#include <stdexcept>
-#include <thread>
+#include <new>
 
-#include "analysis/src/analysis.h"
+#include "analysis/src/job_registry.h"
 #include "platform/tessel/config.h"
-#include "platform/tessel/importer.h"
 #include "tests/analysis/src/fake_job.h"
 
 namespace kelp::analysis {
 namespace {
 
-using ::testing::Contains;
 using ::testing::ElementsAre;
-using Call = std::function<void(FakeJob&, const std::string&)>;
 
 constexpr char kLiteral[] = "$$$/stabilizer/error/Test=Frame lost.";
 
-class ExecutorJobTest : public ::testing::Test {
+class ExecutorJobTest : public FakeJobTest {
  protected:
-  ~ExecutorJobTest() override {
-    job_.reset();
-    analysis_.reset();
-    tessel::threads::Shutdown();
-    EXPECT_EQ(FakeJob::living, 0);
+  // A run of three frames with an interruption at its n-th call.
+  FakeJob& RunWithAt(std::size_t n, const FakeJob::OnCall& interrupt) {
+    return Run(Make(ClipInput(3), [&, seen = std::size_t{0}](auto& self, auto& call) mutable {
+      if (seen++ == n) interrupt(self, call);
+    }));
   }
-
-  FakeJob& Make(std::int64_t frames, Call on_call = {}) {
-    analysis_ = boost::make_shared<Analysis>(SmallSelector(), SmallTracker());
-    job_ = boost::make_shared<FakeJob>(ClipInput(frames), analysis_, on_call);
-    return *job_;
-  }
-  // A whole run, in the background.
-  FakeJob& Run(std::int64_t frames, Call on_call = {}) {
-    FakeJob& job = Make(frames, on_call);
-    job.Start(job_);
-    WaitFor(job);
-    return job;
-  }
-
-  boost::shared_ptr<Analysis> analysis_;
-  boost::shared_ptr<FakeJob> job_;
+  std::size_t CallsOfAWholeRun() { return Run(Make(ClipInput(3))).calls().size(); }
 };
+
+std::ptrdiff_t Count(const std::vector<std::string>& calls, const std::string& begin) {
+  return std::count_if(calls.begin(), calls.end(),
+                       [&](const std::string& call) { return call.rfind(begin, 0) == 0; });
+}
 
 TEST_F(ExecutorJobTest, TellsItsListenersEachStepAndEndsFinished) {
   std::vector<std::string> heard;
-  FakeJob& job = Make(2);
+  FakeJob& job = Make(ClipInput(2));
   EXPECT_EQ(job.end_tick(), -1);
   job.AddStatusListener([&heard](Job& teller, JobStatus status) {
     EXPECT_EQ(teller.GetStatus().state, status.state);
@@ -59,112 +44,87 @@ TEST_F(ExecutorJobTest, TellsItsListenersEachStepAndEndsFinished) {
   job.Start(job_);
   job.Start(job_);  // by a second owner: runs nothing
   WaitFor(job);
-  std::vector<std::string> expected = {"1 0/1"};
-  for (int i = 0; i < 6; ++i) expected.push_back("1 0/1");  // time and field by three readers
-  for (int i = 0; i < 6; ++i) expected.push_back("1 1/25");
+  std::vector<std::string> expected(7, "1 0/1");  // begun; time and field by three readers
+  expected.resize(13, "1 1/25");
   expected.push_back("4 1/25");
   EXPECT_EQ(heard, expected);
   EXPECT_GT(job.end_tick(), 0);
-  const std::vector<std::string> calls = job.calls();
-  EXPECT_EQ(std::count(calls.begin(), calls.end(), "properties"), 1);
-  EXPECT_EQ(std::count(calls.begin(), calls.end(), "release node"), 1);
-  EXPECT_EQ(analysis_->all_features().frame_count, 2);
+  EXPECT_EQ(Count(job.calls(), "properties"), 1);
+  EXPECT_EQ(Count(job.calls(), "node"), 1);
 }
 
-// Cancelled by the host's thread or in the middle of any operation: always finished, never failed,
-// no fetch begun any more, and every frame held is let go.
+// By the host's thread or in the middle of any operation: always finished, never failed, no fetch
+// begun any more, every frame held let go, and the host told.
 TEST_F(ExecutorJobTest, CancelledAtEveryCall) {
-  const std::size_t all = Run(3).calls().size();
-  ASSERT_EQ(all, 36u);
-  for (std::size_t n = 0; n < all - 2; ++n) {
-    std::size_t seen = 0;
+  const std::size_t all = CallsOfAWholeRun();
+  ASSERT_EQ(all, 38u);
+  for (std::size_t n = 0; n < all - 1; ++n) {
     std::string cancelled_at;
-    std::ptrdiff_t fetched_after = 0;
-    FakeJob& job = Run(3, [&](FakeJob& self, const std::string& call) {
-      if (seen++ == n) {
-        self.Cancel();
-        cancelled_at = call;
-      } else if (seen > n + 1 && call.rfind("get", 0) == 0) {
-        ++fetched_after;
-      }
+    FakeJob& job = RunWithAt(n, [&](FakeJob& self, const std::string& call) {
+      self.Cancel();
+      cancelled_at = call;
     });
     EXPECT_EQ(job.GetStatus().state, JobState::Finished) << n;
     EXPECT_TRUE(job.WasCancelled());
     EXPECT_EQ(job.GetErrorText(), "");
-    // A fetch begins with letting go of the frame before.
-    const bool within_fetch = cancelled_at == "release 0" || cancelled_at == "release 1";
-    EXPECT_LE(fetched_after, within_fetch ? 1 : 0) << n;
     const std::vector<std::string> calls = job.calls();
-    const auto count = [&](const std::string& what) {
-      return std::count_if(calls.begin(), calls.end(),
-                           [&](const std::string& c) { return c.rfind(what, 0) == 0; });
-    };
-    EXPECT_EQ(count("get"), count("release ") - count("release node")) << n;
-    EXPECT_EQ(count("release node"), 1);
-    EXPECT_EQ(calls.back(), "cancel requests");
+    const std::vector<std::string> later(calls.begin() + n + 1, calls.end());
+    // A fetch begins with letting go of the frame before.
+    EXPECT_LE(Count(later, "get"), Count({cancelled_at}, "release")) << n;
+    EXPECT_EQ(Count(calls, "get"), Count(calls, "release")) << n;
+    EXPECT_EQ(Count(calls, "node"), 1);
+    EXPECT_EQ(calls[calls.size() - 2], "cancel requests");
+    EXPECT_EQ(calls.back(), "notify");
   }
 }
 
 TEST_F(ExecutorJobTest, FailingAtEveryCallForeseenOrNot) {
-  const std::size_t all = Run(3).calls().size();
-  for (std::size_t n = 0; n < all - 2; ++n) {
-    for (const bool foreseen : {true, false}) {
-      std::size_t seen = 0;
-      FakeJob& job = Run(3, [&](FakeJob& self, const std::string&) {
-        if (seen++ != n) return;
-        if (foreseen) self.Fail(kLiteral);
-        throw std::bad_alloc();
-      });
-      EXPECT_EQ(job.GetStatus().state, JobState::Failed) << n;
-      EXPECT_EQ(job.GetErrorText(), foreseen ? kLiteral : ExecutorJob::kUnknownError) << n;
-      EXPECT_THAT(job.calls(), Contains("release node"));
-      job.Cancel();  // changes nothing any more
-      EXPECT_EQ(job.GetStatus().state, JobState::Failed);
+  const std::size_t all = CallsOfAWholeRun();
+  for (std::size_t n = 1; n < all; ++n) {  // behind the start
+    const bool at_end = n >= all - 3;      // of a run that was whole
+    FakeJob& foreseen = RunWithAt(n, [](FakeJob& self, auto&) { self.Fail(kLiteral); });
+    if (n < all - 1) {
+      EXPECT_EQ(foreseen.GetStatus().state, JobState::Failed) << n;
+      EXPECT_EQ(foreseen.GetErrorText(), kLiteral) << n;
     }
+    EXPECT_EQ(Count(foreseen.calls(), "node"), 1);
+    FakeJob& unforeseen = RunWithAt(n, [](auto&, auto&) { throw std::bad_alloc(); });
+    EXPECT_EQ(unforeseen.GetStatus().state, at_end ? JobState::Finished : JobState::Failed) << n;
+    EXPECT_EQ(unforeseen.GetErrorText(), at_end ? "" : ExecutorJob::kUnknownError) << n;
+    const std::vector<std::string> calls = unforeseen.calls();
+    EXPECT_EQ(Count(calls, "cancel requests"), 1) << n;
+    EXPECT_EQ(Count(calls, "notify"), 1) << n;
+    EXPECT_EQ(Count(calls, "node"), 1) << n;
+    unforeseen.Cancel();  // changes nothing any more
+    EXPECT_FALSE(unforeseen.WasCancelled());
   }
 }
 
+TEST_F(ExecutorJobTest, KeepsTheTextOfItsFirstFailure) {
+  FakeJob& job = RunWithAt(10, [](FakeJob& self, auto&) {
+    EXPECT_THROW(self.Fail(kLiteral), tessel::config::Error);
+    self.Fail("$$$/stabilizer/error/Second=And another.");
+  });
+  EXPECT_EQ(job.GetErrorText(), kLiteral);
+}
+
 TEST_F(ExecutorJobTest, CancelledBeforeItsThreadTakesItUp) {
-  FakeJob& job = Make(5);
+  FakeJob& job = Make(ClipInput(5));
   job.executor().Pause();
   job.Start(job_);
   CancelJob(job);  // lifts the pause; what was posted still runs
   WaitFor(job);
   EXPECT_EQ(job.GetStatus().state, JobState::Finished);
-  EXPECT_THAT(job.calls(), ElementsAre("release node", "cancel requests"));
+  EXPECT_THAT(job.calls(), ElementsAre("start", "node", "cancel requests", "notify"));
   // Its queue has ended: a job that nobody can begin says so.
-  FakeJob& late = Make(5);
+  FakeJob& late = Make(ClipInput(5));
   late.executor().EndQueue();
   late.Start(job_);
   EXPECT_EQ(late.GetStatus().state, JobState::Failed);
 }
 
-TEST_F(ExecutorJobTest, RestsWhileTheHostPauses) {
-  tessel::threads::CompletionEvent begun, go_on;
-  FakeJob& job = Make(4, [&](FakeJob&, const std::string& call) {
-    if (call != "get 1") return;
-    begun.Signal();
-    go_on.Wait();
-  });
-  job.Start(job_);
-  begun.Wait();
-  tessel::importer::PauseBackgroundWork(true);
-  go_on.Signal();
-  // The next fetch waits; all that can be seen is that the job does not end by itself.
-  for (int i = 0; i < 50; ++i) {
-    ASSERT_EQ(job.GetStatus().state, JobState::Running);
-    std::this_thread::sleep_for(std::chrono::milliseconds(1));
-  }
-  const std::vector<std::string> calls = job.calls();
-  EXPECT_EQ(std::count(calls.begin(), calls.end(), "get 1"), 1);
-  tessel::importer::PauseBackgroundWork(false);
-  WaitFor(job);
-  EXPECT_EQ(job.GetStatus().state, JobState::Finished);
-}
-
 TEST_F(ExecutorJobTest, DropsItsOwnersOnItsOwnThread) {
-  FakeJob& job = Make(3);
-  job.Start(job_);
+  Make(ClipInput(3)).Start(job_);
   job_.reset();
   analysis_.reset();
   tessel::threads::Shutdown();  // waits for the run

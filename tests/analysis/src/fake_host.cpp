@@ -6,12 +6,9 @@
 #include <cstdarg>
 #include <cstdio>
 
+#include "host/timeline/string_table.h"
 #include "platform/tessel/guid.h"
 #include "platform/tessel/utility.h"
-
-struct HX_StringRecord {
-  std::string text;
-};
 
 namespace kelp::analysis {
 namespace {
@@ -42,7 +39,7 @@ HX_Err AnswerText(const char* operation, const std::u16string& text, std::uint16
 
 HX_Err AnswerString(const char* operation, const std::string& text, HX_String* string) {
   if (const HX_Err code = Called(operation)) return code;
-  *string = new HX_StringRecord{text};
+  *string = new HX_StringRecord{text, {}};
   ++host->strings;
   return HX_ERR_NONE;
 }
@@ -120,7 +117,7 @@ const HX_StringSuite1& StringSuite() {
       return AnswerString("MakeFromUTF8", text, string);
     };
     table.GetUTF8 = [](HX_String string, const char** text) {
-      return Answer("GetUTF8", text, string->text.c_str());
+      return Answer("GetUTF8", text, string->utf8.c_str());
     };
     table.Dispose = [](HX_String string) {
       delete string;

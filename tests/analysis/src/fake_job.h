@@ -1,5 +1,7 @@
 #pragma once
 
+#include <gtest/gtest.h>
+
 #include <algorithm>
 #include <atomic>
 #include <boost/make_shared.hpp>
@@ -9,7 +11,7 @@
 #include <string>
 #include <vector>
 
-#include "analysis/src/analyzer.h"
+#include "analysis/src/analysis.h"
 #include "analysis/src/executor_job.h"
 #include "platform/tessel/threads.h"
 
@@ -28,9 +30,9 @@ inline JobInput ClipInput(std::int64_t frames, std::int64_t start = 0, std::int3
 }
 
 // Settings under which the frames below give tracks, at little cost.
-inline marrow::tracking::SelectorParams SmallSelector() {
+inline marrow::tracking::SelectorParams SmallSelector(std::uint64_t slots = 8) {
   marrow::tracking::SelectorParams selector;
-  selector.max_count = 8;
+  selector.max_count = slots;
   selector.spacing = 4;
   selector.half_winx = selector.half_winy = 2;
   selector.border = 5;
@@ -43,18 +45,17 @@ inline marrow::tracking::TrackerParams SmallTracker() {
   return tracker;
 }
 
-// Bright squares that move half a pixel a row of the run, in 8-bit alpha, red, green, blue.
-inline std::vector<std::uint8_t> DrawFrame(double shift) {
+// Bright squares that move half a pixel a row of the run, in 8-bit alpha, red, green, blue; the
+// last row first if it is flipped.
+inline std::vector<std::uint8_t> DrawFrame(double shift, bool flip = false) {
   std::vector<std::uint8_t> pixels(kWidth * kHeight * 4, 255);
   for (int y = 0; y < kHeight; ++y) {
     for (int x = 0; x < kWidth; ++x) {
-      const double u = x - shift;
-      const double column = std::min(std::max(0.0, std::fmod(u + 480, 12) - 3), 6.0);
+      const double column = std::clamp(std::fmod(x - shift + 480, 12) - 3, 0.0, 6.0);
       const bool row = y % 11 >= 3 && y % 11 < 8;
       const double value = row ? 40 + 30 * std::min(column, 6 - column) + y : 40;
-      for (int c = 1; c < 4; ++c) {
-        pixels[(y * kWidth + x) * 4 + c] = static_cast<std::uint8_t>(value);
-      }
+      const int place = (flip ? kHeight - 1 - y : y) * kWidth + x;
+      std::fill_n(&pixels[place * 4 + 1], 3, static_cast<std::uint8_t>(value));
     }
   }
   return pixels;
@@ -63,33 +64,28 @@ inline std::vector<std::uint8_t> DrawFrame(double shift) {
 // A job over drawn frames that notes what it is asked. Frames are named by their index in the run.
 class FakeJob final : public ExecutorJob {
  public:
-  FakeJob(const JobInput& input, const boost::shared_ptr<Analysis>& analysis,
-          std::function<void(FakeJob&, const std::string&)> on_call = {})
+  using OnCall = std::function<void(FakeJob& self, const std::string& call)>;
+
+  FakeJob(const JobInput& input, const boost::shared_ptr<Analysis>& analysis, OnCall on_call = {})
       : ExecutorJob(input, analysis), on_call_(std::move(on_call)) {
     ++living;
   }
   ~FakeJob() override { --living; }
 
+  void Start(boost::shared_ptr<Job> shared_self) override {
+    Note("start");
+    ExecutorJob::Start(shared_self);
+  }
   bool RequestFrame(const RationalTime& time, std::int32_t) override {
     Note("request " + Name(time));
     return false;
   }
   void GetFrame(const RationalTime& time, std::int32_t, std::int32_t* row_bytes, bool* flipped,
                 std::uint32_t* format, const std::uint8_t** pixels) override {
-    WaitPoint();
-    NotifyHost();
     Note("get " + Name(time));
-    frame_ = DrawFrame(0.5 * std::stoi(Name(time)));
+    frame_ = DrawFrame(0.5 * std::stoi(Name(time)), flip);
     *row_bytes = kWidth * 4;
     *flipped = flip;
-    if (flip) {
-      std::vector<std::uint8_t> upside_down;
-      for (int y = kHeight; y-- > 0;) {
-        upside_down.insert(upside_down.end(), frame_.begin() + y * *row_bytes,
-                           frame_.begin() + (y + 1) * *row_bytes);
-      }
-      frame_ = upside_down;
-    }
     *format = 0;
     *pixels = frame_.data();
   }
@@ -112,9 +108,9 @@ class FakeJob final : public ExecutorJob {
 
  private:
   void ReadProperties() override { Note("properties"); }
-  void ReleaseNode() override { Note("release node"); }
+  void ReleaseNode() override { Note("node"); }
   void CancelRequests() override { Note("cancel requests"); }
-  void NotifyHost() override {}
+  void NotifyHost() override { Note("notify"); }
 
   std::string Name(const RationalTime& time) const {
     const RationalTime row = RowDuration(input());
@@ -128,7 +124,7 @@ class FakeJob final : public ExecutorJob {
     if (on_call_) on_call_(*this, call);
   }
 
-  const std::function<void(FakeJob&, const std::string&)> on_call_;
+  const OnCall on_call_;
   mutable std::mutex mutex_;
   std::vector<std::string> calls_;  // guarded by mutex_
   std::vector<std::uint8_t> frame_;
@@ -143,5 +139,32 @@ inline void WaitFor(ExecutorJob& job) {
     tessel::threads::Shutdown();  // the queue has ended
   }
 }
+
+// Of an analysis and its job over drawn frames.
+class FakeJobTest : public ::testing::Test {
+ protected:
+  ~FakeJobTest() override {
+    job_.reset();
+    analysis_.reset();
+    tessel::threads::Shutdown();
+    EXPECT_EQ(FakeJob::living, 0);
+  }
+
+  FakeJob& Make(const JobInput& input, FakeJob::OnCall on_call = {},
+                const marrow::tracking::TrackerParams& tracker = SmallTracker()) {
+    analysis_ = boost::make_shared<Analysis>(SmallSelector(), tracker);
+    job_ = boost::make_shared<FakeJob>(input, analysis_, on_call);
+    return *job_;
+  }
+  // A job that was made does its whole run, in the background.
+  FakeJob& Run(FakeJob& job) {
+    job.Start(job_);
+    WaitFor(job);
+    return job;
+  }
+
+  boost::shared_ptr<Analysis> analysis_;
+  boost::shared_ptr<FakeJob> job_;
+};
 
 }  // namespace kelp::analysis

@@ -2,19 +2,20 @@
 
 #include <gtest/gtest.h>
 
-#include <cmath>
+#include <boost/make_shared.hpp>
 
 #include "analysis/src/analysis_state.h"
 #include "platform/tessel/utility.h"
-#include "tests/analysis/src/fake_host.h"
 #include "tests/analysis/src/fake_job.h"
+#include "tests/effect/host_records.h"
 
 namespace kelp::analysis {
 namespace {
 
+using calmframe::host::Operations;
 using tessel::utility::HighPrecisionTime;
 
-// Says what the analyzer of a real one would at a point of its run.
+// Says what the analyzer of a real one would when this row is finished.
 class StandingAnalyzer final : public Analyzer {
  public:
   StandingAnalyzer(const JobInput& input, std::int64_t row) : Analyzer(AnalyzerRecord(), {}) {
@@ -33,85 +34,73 @@ class StandingAnalyzer final : public Analyzer {
   JobStatus status_;
 };
 
-class ProgressTest : public ::testing::Test {
+class ProgressTest : public calmframe::host::HostRecords {
  protected:
-  // The label of a clip of `frames` frames from frame 40 on with this row finished last.
   std::string Text(std::int64_t frames, std::int64_t row, std::int32_t field = 0) {
     state_.analyzer = boost::make_shared<StandingAnalyzer>(ClipInput(frames, 40, field), row);
-    return GetProgressText(state_, &host_.in, &host_.out);
-  }
-  // The same when the analysis and the display's cycle began so many seconds ago.
-  std::string TextAfter(double elapsed, double age, std::int64_t frames, std::int64_t row) {
-    const std::uint64_t now = HighPrecisionTime::Now();
-    state_.progress.start_tick = Before(now, elapsed);
-    state_.progress.display_tick = Before(now, age);
-    return Text(frames, row);
+    return GetProgressText(state_, &in_, &out_);
   }
   static std::uint64_t Before(std::uint64_t now, double seconds) {
     const double a_tick = static_cast<double>(HighPrecisionTime::ToNanoseconds(1000000)) / 1e15;
     return now - static_cast<std::uint64_t>(static_cast<std::int64_t>(seconds / a_tick));
   }
 
-  FakeHost host_;
   AnalysisState state_;
 };
 
 TEST_F(ProgressTest, FramesWordForWord) {
-  EXPECT_EQ(Text(300, 0), "0% (frame 1 of 300)");
-  EXPECT_EQ(Text(300, 150), "50% (frame 151 of 300)");
-  EXPECT_EQ(Text(300, 299), "99% (frame 300 of 300)");
-  EXPECT_EQ(Text(300, 400), "99% (frame 300 of 300)");
-  EXPECT_EQ(Text(1, 0), "0% (frame 1 of 1)");
-  EXPECT_EQ(Text(0, 0), "0% (frame 0 of 0)");
-  // Two rows a frame.
-  EXPECT_EQ(Text(10, 4, 1), "20% (frame 3 of 10)");
-  EXPECT_EQ(Text(10, 5, 1), "20% (frame 3 of 10)");
-  EXPECT_EQ(Text(10, 6, 1), "30% (frame 4 of 10)");
+  const struct {
+    std::int64_t frames, row;
+    std::int32_t field;
+    const char* text;
+  } labels[] = {{300, 0, 0, "0% (frame 1 of 300)"},      {300, 150, 0, "50% (frame 151 of 300)"},
+                {300, 299, 0, "99% (frame 300 of 300)"}, {300, 400, 0, "99% (frame 300 of 300)"},
+                {300, -50, 0, "0% (frame 1 of 300)"},    {1, 0, 0, "0% (frame 1 of 1)"},
+                {0, 0, 0, "0% (frame 0 of 0)"},          {10, 4, 1, "20% (frame 3 of 10)"},
+                {10, 5, 1, "20% (frame 3 of 10)"},       {10, 6, 1, "30% (frame 4 of 10)"}};
+  for (const auto& [frames, row, field, text] : labels) EXPECT_EQ(Text(frames, row, field), text);
+  state_.analyzer->set_job_stage(JobStage::NotStarted);
+  EXPECT_EQ(GetProgressText(state_, &in_, &out_), "0% (frame 1 of 10)");
 }
 
+// 10 of 110 frames done: what is left takes ten times what has passed, and only counts down.
 TEST_F(ProgressTest, TimeWordForWord) {
-  // 10 of 110 frames done: what is left takes ten times what has passed.
-  EXPECT_EQ(TextAfter(12, 7, 110, 10), "Time remaining: 2 minutes");   // 120.1 s or so
-  EXPECT_EQ(TextAfter(8.89, 7, 110, 10), "Time remaining: 1 minute");  // 89
-  EXPECT_EQ(TextAfter(5.49, 7, 110, 10), "Time remaining: 1 minute");  // 55
-  EXPECT_EQ(TextAfter(5.39, 7, 110, 10), "Time remaining: 54 seconds");
-  EXPECT_EQ(TextAfter(0.39, 7, 110, 10), "Time remaining: 4 seconds");
-  EXPECT_EQ(TextAfter(0.29, 7, 110, 10), "9% (frame 11 of 110)");
-}
-
-TEST_F(ProgressTest, TheTimeOnlyCountsDown) {
-  EXPECT_EQ(TextAfter(3.995, 7, 110, 10), "Time remaining: 40 seconds");
-  EXPECT_EQ(TextAfter(30, 7, 110, 10), "Time remaining: 40 seconds");
-  EXPECT_EQ(state_.progress.remaining_seconds, 40);
-  EXPECT_EQ(TextAfter(1.995, 7, 110, 10), "Time remaining: 20 seconds");
+  const std::pair<double, const char*> labels[] = {
+      {12, "Time remaining: 2 minutes"},                                         // 120.1 s
+      {30, "Time remaining: 2 minutes"},    {8.85, "Time remaining: 1 minute"},  // 89
+      {5.45, "Time remaining: 1 minute"},                                        // 55
+      {5.35, "Time remaining: 54 seconds"}, {3.95, "Time remaining: 40 seconds"},
+      {30, "Time remaining: 40 seconds"},   {0.35, "Time remaining: 4 seconds"},
+      {0.25, "9% (frame 11 of 110)"}};
+  for (const auto& [elapsed, text] : labels) {
+    const std::uint64_t now = HighPrecisionTime::Now();
+    state_.progress.start_tick = Before(now, elapsed);
+    state_.progress.display_tick = Before(now, 7);
+    EXPECT_EQ(Text(110, 10), text) << elapsed;
+  }
 }
 
 TEST_F(ProgressTest, FramesForSixSecondsThenTimeForThree) {
-  const auto second = [start = HighPrecisionTime::Now()](double seconds) {
-    return Before(start, -seconds);
-  };
-  ProgressClock clock{second(0), 0, 0};
-  const auto kind = [&](std::int64_t position, double at) {
-    return NextProgress(clock, 0, 1000, position, second(at)).kind;
-  };
-  EXPECT_EQ(kind(3, 100), ProgressKind::Frames);  // three done: too few
-  EXPECT_EQ(clock.display_tick, 0u);
-  EXPECT_EQ(kind(4, 100), ProgressKind::Frames);  // the cycle begins
-  EXPECT_EQ(kind(50, 105.9), ProgressKind::Frames);
-  EXPECT_NE(kind(50, 106.1), ProgressKind::Frames);
-  EXPECT_NE(kind(50, 108.9), ProgressKind::Frames);
-  EXPECT_EQ(kind(50, 109.1), ProgressKind::Frames);
-  EXPECT_EQ(clock.display_tick, 0u);
-  EXPECT_EQ(kind(50, 109.2), ProgressKind::Frames);  // the next one begins
-  EXPECT_NE(kind(50, 115.3), ProgressKind::Frames);
+  const std::uint64_t start = HighPrecisionTime::Now();
+  ProgressClock clock{start, 0, 0};
+  const struct {
+    std::int64_t position;
+    double at;
+    bool shows_frames, cycle_runs;
+  } looks[] = {{3, 100, true, false},  // three done: too few
+               {4, 100, true, true},     {50, 105.9, true, true},  {50, 106.1, false, true},
+               {50, 108.9, false, true}, {50, 109.1, true, false}, {50, 109.2, true, true},
+               {50, 115.3, false, true}};
+  for (const auto& [position, at, shows_frames, cycle_runs] : looks) {
+    const ProgressMessage message = NextProgress(clock, 0, 1000, position, Before(start, -at));
+    EXPECT_EQ(message.kind == ProgressKind::Frames, shows_frames) << at;
+    EXPECT_EQ(clock.display_tick != 0, cycle_runs) << at;
+  }
 }
 
 TEST_F(ProgressTest, HandsOnWhatTheHostAnswers) {
-  host_.failing = {{"ConvertText", 321}};
+  Operations::Get().FailNth(1, "Private Effect.ConvertText");
   EXPECT_THROW(Text(10, 1), std::int32_t);
-  host_.missing = {"HX OV Private Effect Suite"};
-  EXPECT_THROW(Text(10, 1), std::int32_t);
-  EXPECT_STREQ(host_.out.return_msg, "Not able to acquire OVK Suite.");
 }
 
 }  // namespace
