@@ -144,18 +144,27 @@ constexpr HX_PrivateEffectSuite3 kPrivateEffect = {ConvertText, GetLayerData, Re
 
 // -- App, Adv App --
 
-// Of windows that this host does not have.
-HX_Err InvalidateRect(void*, const HX_Rect*) {
-  return WithHost("App.InvalidateRect", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+HX_Err InvalidateRect(void*, const HX_Rect* rect) {
+  return WithHost("App.InvalidateRect", [&](Host& host) -> HX_Err {
+    host.user_interface().Invalidate(rect ? *rect : HX_Rect{});
+    return HX_ERR_NONE;
+  });
 }
 
 HX_Err RefreshAllWindows() {
-  return WithHost("Adv App.RefreshAllWindows", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+  return WithHost("Adv App.RefreshAllWindows", [](Host& host) -> HX_Err {
+    host.user_interface().Refresh();
+    return HX_ERR_NONE;
+  });
 }
 
 HX_Err InfoText(const char* line1, const char* line2) {
   return WithHost("Adv App.InfoText", [&](Host& host) -> HX_Err {
-    host.user_interface().SetInfo(line1 ? line1 : "", line2 ? line2 : "");
+    if (line1 || line2) {
+      host.user_interface().SetInfo(line1 ? line1 : "", line2 ? line2 : "");
+    } else {
+      host.user_interface().ClearInfo();
+    }
     return HX_ERR_NONE;
   });
 }
