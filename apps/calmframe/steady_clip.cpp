@@ -172,15 +172,17 @@ void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
     if (!stage.empty()) {
       reuse.framing = false;
       if (work == Work::analysing) reuse.analysis = false;
+      const bool begins = stage != shown.stage;
       if (work == Work::analysing) {
-        if (stage != shown.stage) delivered_before = delivered;
+        if (begins) delivered_before = delivered;
         shown.unit = "frames";
         shown.total = FramesToAnalyse(*effect_->shared()->layer()->state());
         shown.done = std::min(static_cast<double>(delivered - delivered_before), shown.total);
       }
       shown.stage = stage;
       shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
-      if (shown.says.find('(') == std::string::npos) shown.says.clear();  // the bare name
+      // Nothing is done yet, whatever it says by now; or it says its bare name.
+      if (begins || shown.says.find('(') == std::string::npos) shown.says.clear();
       progress.Show(shown);
     }
     return InterruptAsked();
