@@ -211,15 +211,16 @@ TEST_F(AnalyzerTest, ANewAnalysisOfTheStateEndsTheOldOne) {
   tessel::threads::Shutdown();
   EXPECT_TRUE(jobs_[0].expired());
   EXPECT_TRUE(state.TakeResults());
-  EXPECT_EQ(state.all_features.frame_count, 3);
-  EXPECT_EQ(state.first_frame, 7);
-  EXPECT_EQ(state.tracker_identity, GetIdentifierForTracker(SmallSelector(), SmallTracker()));
-  EXPECT_EQ(GetIdentifierForJobInput(state.job_input), state.analyzer->record().job_guid);
+  EXPECT_EQ(state.table().frame_count, 3);
+  EXPECT_EQ(state.table().first_frame, 7);
+  EXPECT_EQ(state.result->tracker_identity,
+            GetIdentifierForTracker(SmallSelector(), SmallTracker()));
+  EXPECT_EQ(GetIdentifierForJobInput(state.result->job_input), state.analyzer->record().job_guid);
   EXPECT_FALSE(state.result_identity.IsNil());
   state.EndAnalyzer(&in_, &out_);
   EXPECT_TRUE(jobs_[1].expired());
   EXPECT_FALSE(state.TakeResults());
-  EXPECT_EQ(state.all_features.frame_count, 3);
+  EXPECT_EQ(state.table().frame_count, 3);
 }
 
 // What a save and a reload in the same process do: the analyzer goes without a word to its job.

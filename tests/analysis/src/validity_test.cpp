@@ -19,11 +19,13 @@ class ValidityTest : public calmframe::host::HostRecords {
  protected:
   ValidityTest() {
     Place(10, 20);
-    state_.job_input = Input();
-    state_.tracker_identity = GetIdentifierForTracker(selector_, {});
-    state_.source_identity = GetUpstreamIdentifier(&in_, &out_);
-    state_.all_features.frame_count = 20;
-    state_.first_frame = 10;
+    analysis::Replace(state_.result, [this](AnalysisResult& result) {
+      result.job_input = Input();
+      result.tracker_identity = GetIdentifierForTracker(selector_, {});
+      result.source_identity = GetUpstreamIdentifier(&in_, &out_);
+      result.all_features.frame_count = 20;
+      result.all_features.first_frame = 10;
+    });
   }
 
   JobInput Input() { return ReadJobInput(&in_, &out_); }
@@ -39,13 +41,24 @@ class ValidityTest : public calmframe::host::HostRecords {
     return static_cast<int>(GetAnalysisStatus(state_, frame, &input));
   }
 
+  // A field of what was analysed.
+  template <class Value>
+  void Set(Value AnalysisResult::*field, const Value& value) {
+    analysis::Replace(state_.result, [&](AnalysisResult& result) { result.*field = value; });
+  }
+  void SetFrames(std::int32_t count) {
+    analysis::Replace(state_.result, [&](AnalysisResult& r) { r.all_features.frame_count = count; });
+  }
+
   AnalysisState state_;
   marrow::tracking::SelectorParams selector_;
 };
 
 TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
   EXPECT_TRUE(Current());
-  state_.job_input.ProjectPath = u"/moved/since";
+  JobInput moved = state_.result->job_input;
+  moved.ProjectPath = u"/moved/since";
+  Set(&AnalysisResult::job_input, moved);
   EXPECT_TRUE(Current());
   const LayerState layer = *layer_->state();
   const std::function<void(LayerState&)> changes[] = {
@@ -60,41 +73,43 @@ TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
     layer_->Change([&](LayerState& l) { l = layer; });
     EXPECT_TRUE(Current());
   }
-  const auto stale_with = [this](auto& place, auto value) {
-    const auto before = std::exchange(place, value);
-    EXPECT_FALSE(Current());
-    place = before;
-    EXPECT_TRUE(Current());
-  };
-  stale_with(selector_.spacing, 11);
-  stale_with(state_.source_identity, Guid());
-  stale_with(state_.all_features.frame_count, 0);
+  selector_.spacing = 11;
+  EXPECT_FALSE(Current());
+  selector_ = {};
+  const Guid source = state_.result->source_identity;
+  Set(&AnalysisResult::source_identity, Guid());
+  EXPECT_FALSE(Current());
+  Set(&AnalysisResult::source_identity, source);
+  SetFrames(0);
+  EXPECT_FALSE(Current());
+  SetFrames(20);
+  EXPECT_TRUE(Current());
   const auto asked = Operations::Get().count();
   AnalysisState empty;
   EXPECT_FALSE(IsAnalysisCurrent(empty, {[this] { return Input(); }, {}, {}}, &out_));
-  EXPECT_EQ(Operations::Get().count(), asked);  // nothing for it
-  state_.tracker_identity = Guid();             // of an old project: not compared
+  EXPECT_EQ(Operations::Get().count(), asked);     // nothing for it
+  Set(&AnalysisResult::tracker_identity, Guid());  // of an old project: not compared
   selector_.spacing = 11;
   EXPECT_TRUE(Current());
   host_->media().faults.node_missing = true;  // a source that can't be told is like no other
-  state_.source_identity = Guid();
+  Set(&AnalysisResult::source_identity, Guid());
   EXPECT_FALSE(Current());
 }
 
 TEST_F(ValidityTest, ASourceThatChangedBackWhileAskedStaysCurrent) {
-  const Guid stored = state_.source_identity, other = Guid::MakeUnique();
+  const Guid stored = state_.result->source_identity, other = Guid::MakeUnique();
   PresentInputs present;
-  present.job_input = [this] { return state_.job_input; };
-  present.tracker_identity = [this] { return state_.tracker_identity; };
+  present.job_input = [this] { return state_.result->job_input; };
+  present.tracker_identity = [this] { return state_.result->tracker_identity; };
   int asked = 0;
   present.source_identity = [&] { return ++asked == 1 ? other : stored; };
   EXPECT_TRUE(IsAnalysisCurrent(state_, present, &out_));
-  EXPECT_EQ(state_.source_identity, other);
+  EXPECT_EQ(state_.result->source_identity, other);
   asked = 0;
   present.source_identity = [&] { return ++asked, Guid::MakeUnique(); };
   EXPECT_FALSE(IsAnalysisCurrent(state_, present, &out_));
   EXPECT_EQ(asked, 2);
-  EXPECT_EQ(state_.source_identity, other);
+  EXPECT_EQ(state_.result->source_identity, other);
 }
 
 TEST_F(ValidityTest, WhatCannotBeLearntIsStaleWithoutAMessage) {
@@ -130,9 +145,11 @@ TEST_F(ValidityTest, StatusOfAFrame) {
     });
     EXPECT_EQ(Status(frame), status) << start << " " << count << " " << frame;
   }
-  state_.job_input.FieldType = -1;
+  JobInput other = state_.result->job_input;
+  other.FieldType = -1;
+  Set(&AnalysisResult::job_input, other);
   EXPECT_EQ(Status(14), 3);
-  state_.all_features.frame_count = 0;
+  SetFrames(0);
   EXPECT_EQ(Status(14), 1);
   state_.analysis_pending = true;
   EXPECT_EQ(Status(14), 4);
