@@ -41,8 +41,8 @@ string(REGEX REPLACE "/$" "" prefix_from_pkgconfig "${prefix_from_pkgconfig}")
 configure_file(cmake/package/calmframe.pc.in calmframe.pc @ONLY)
 install(FILES "${CMAKE_BINARY_DIR}/calmframe.pc" DESTINATION "${CMAKE_INSTALL_LIBDIR}/pkgconfig")
 
-install(FILES README.md cmake/package/copyright DESTINATION "${CMAKE_INSTALL_DOCDIR}")
-install(DIRECTORY docs DESTINATION "${CMAKE_INSTALL_DOCDIR}" FILES_MATCHING PATTERN "*.md" PATTERN "*.png")
+install(FILES README.md CHANGELOG.md LICENSE cmake/package/copyright DESTINATION "${CMAKE_INSTALL_DOCDIR}")
+install(DIRECTORY docs DESTINATION "${CMAKE_INSTALL_DOCDIR}" FILES_MATCHING PATTERN "*.md" PATTERN "*.png" PATTERN "*.svg")
 install(FILES examples/minimal_host.c DESTINATION "${CMAKE_INSTALL_DOCDIR}/examples")
 execute_process(COMMAND gzip -9nc "${CMAKE_SOURCE_DIR}/cmake/package/changelog" OUTPUT_FILE "${CMAKE_BINARY_DIR}/changelog.gz"
   COMMAND_ERROR_IS_FATAL ANY)
