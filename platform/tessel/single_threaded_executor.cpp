@@ -134,7 +134,7 @@ class Pool {
   void StartThread(const boost::shared_ptr<Queue>& queue) {
     internal::BeginThread();
     try {
-      std::thread([this, queue]() mutable {
+      std::thread([this, queue = queue]() mutable {
         Serve(std::move(queue));
         internal::EndThread();
       }).detach();

@@ -45,7 +45,7 @@ std::string Quoted(const std::string& text) {
 }  // namespace
 
 std::string BashCompletion(const CLI::App& program) {
-  const std::string name = OutlineOf(program).name;
+  const std::string& name = OutlineOf(program).name;
   std::vector<std::string> commands;
   std::string cases;
   std::map<std::string, Argument> with_value;  // a flag means the same in all commands
@@ -103,7 +103,7 @@ complete -F _)" +
 }
 
 std::string ZshCompletion(const CLI::App& program) {
-  const std::string name = OutlineOf(program).name;
+  const std::string& name = OutlineOf(program).name;
   std::string commands, cases;
   for (const Command& command : CommandsOf(program)) {
     commands += "    " + Quoted(command.name + ":" + command.summary) + "\n";
@@ -126,7 +126,7 @@ std::string ZshCompletion(const CLI::App& program) {
 }
 
 std::string FishCompletion(const CLI::App& program) {
-  const std::string name = OutlineOf(program).name;
+  const std::string& name = OutlineOf(program).name;
   const auto quoted = [](const std::string& text) {
     return std::string("'").append(Escaped(text, "'\\")).append("'");
   };

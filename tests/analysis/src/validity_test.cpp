@@ -47,7 +47,8 @@ class ValidityTest : public calmframe::host::HostRecords {
     analysis::Replace(state_.result, [&](AnalysisResult& result) { result.*field = value; });
   }
   void SetFrames(std::int32_t count) {
-    analysis::Replace(state_.result, [&](AnalysisResult& r) { r.all_features.frame_count = count; });
+    analysis::Replace(state_.result,
+                      [&](AnalysisResult& r) { r.all_features.frame_count = count; });
   }
 
   AnalysisState state_;

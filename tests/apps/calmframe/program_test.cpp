@@ -358,7 +358,7 @@ TEST_F(ProgramTest, ADamagedClipIsToldOfInEveryRun) {
 // Damage that only decoding tells, which the analysis is the first to do: whoever watches sees one
 // run, and the pipe gets one stream.
 TEST_F(ProgramTest, DamageThatTheAnalysisMeetsIsToldAsIfItHadBeenSeenBefore) {
-  MakeClip("in.mp4", 160, 120, 60);
+  MakeClip("in.mp4", 320, 240, 60);
   std::string bytes = Content("in.mp4");
   bytes.replace(bytes.find("mdat") + (bytes.size() / 3), 40, 40, 'x');
   MakeFile("in.mp4", bytes);
