@@ -5,7 +5,7 @@
 #include <optional>
 #include <vector>
 
-#include "synthetic/frame_source.h"
+#include "synthetic/drawn_frames.h"
 #include "tracking/tracking_run.h"
 
 // The whole tracking loop on frames of a known world: where its tracks are, beside where they

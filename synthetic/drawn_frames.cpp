@@ -1,4 +1,4 @@
-#include "synthetic/frame_source.h"
+#include "synthetic/drawn_frames.h"
 
 namespace synthetic {
 
