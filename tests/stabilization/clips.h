@@ -136,6 +136,18 @@ inline std::string spans_of(const std::vector<transition_record>& records) {
   return text;
 }
 
+// The motion of what is unsolved is the identity, and no track has a place there.
+inline void expect_unsolved_untouched(const stabilizer_global& global,
+                                      const std::vector<transition_record>& records) {
+  for (const transition_record& r : records) {
+    if (r.kind == transition_record::solved) continue;
+    for (std::size_t k = 0; k < r.motion.size(); ++k) ASSERT_EQ(r.motion[k], k % 4 == 0);
+    for (std::size_t i = r.first * global.feature_count; i < r.end * global.feature_count; ++i) {
+      ASSERT_EQ(global.output[i].status, -1);
+    }
+  }
+}
+
 // Points all over a 1080p frame, at least 100 pixels inside.
 inline point2 scattered(std::size_t slot) {
   return {100.0 + static_cast<double>(slot * 379 % 1720),

@@ -15,11 +15,8 @@ template <class Wanted>
 boost::shared_ptr<stabilizer_global> clip_of(int tracks, int frames, Wanted wanted) {
   auto global = boost::make_shared<stabilizer_global>(empty_clip(tracks, frames));
   std::mt19937 random(11);
-  std::uniform_real_distribution<double> unit(0, 1);
-  for (int s = 0; s < tracks; ++s) {
-    const point2 p = {unit(random) * (kWidth - 1), unit(random) * (kHeight - 1)};
-    add_still(*global, s, 0, frames, p, wanted);
-  }
+  std::uniform_real_distribution<double> x(0, kWidth - 1), y(0, kHeight - 1);
+  for (int s = 0; s < tracks; ++s) add_still(*global, s, 0, frames, {x(random), y(random)}, wanted);
   return global;
 }
 
