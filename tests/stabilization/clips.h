@@ -82,6 +82,14 @@ inline stabilizer_global empty_clip(std::size_t slots, std::size_t frames) {
   return global;
 }
 
+// A window of no overlap.
+inline factorization_window window_over(std::uint64_t first, std::uint64_t end) {
+  factorization_window window;
+  window.first = window.overlap_end = first;
+  window.end = end;
+  return window;
+}
+
 // Puts samples into the slot over [first, end); at(frame) tells where the track is.
 template <class At>
 void put_track(stabilizer_global& global, std::size_t slot, int first, int end, At at) {

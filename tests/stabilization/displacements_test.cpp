@@ -88,9 +88,7 @@ TEST(BlendedDisplacementsTest, TracksAreCutToTheirStabilizedSamplesAndFadeFromTh
 
 // Window [40, 100) whose first 30 frames had been solved before, 8 pixels to the right.
 factorization_window overlapping(const stabilizer_global& global) {
-  factorization_window window;
-  window.first = 40;
-  window.end = 100;
+  factorization_window window = window_over(40, 100);
   window.overlap_end = 70;
   window.overlap_rows.assign(global.output.begin() + 40 * global.feature_count,
                              global.output.begin() + 70 * global.feature_count);
@@ -129,14 +127,9 @@ TEST(MemberDisplacementsTest, TracksRunAsLongAsTheirWindowsListThem) {
   stabilizer_global global = empty_clip(3, 120);
   for (int s = 0; s < 3; ++s) add_moving(global, s, 0, 120);
   for (track_sample& sample : global.output) sample.status = -1;  // nothing solved yet
-  std::vector<factorization_window> windows(2);
-  windows[0].first = 10;
-  windows[0].end = 60;
-  windows[0].trajectory_flags = {1, 1};
-  windows[1].first = 50;
-  windows[1].end = 100;
+  std::vector<factorization_window> windows = {window_over(10, 60), window_over(50, 100)};
+  for (factorization_window& window : windows) window.trajectory_flags = {1, 1};
   windows[1].trajectories_begin = 1;
-  windows[1].trajectory_flags = {1, 1};
   expect_lists(member_displacements(global, windows, {}), 3,
                [](int f, int s) { return f >= (s == 2 ? 50 : 10) && f < (s == 0 ? 50 : 100); });
 }

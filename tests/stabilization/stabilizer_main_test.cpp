@@ -9,7 +9,6 @@
 #include <utility>
 #include <vector>
 
-#include "stabilization/factorization/window_filters.h"
 #include "stabilization/warp/cp_warper.h"
 #include "tests/stabilization/solve_clips.h"
 
@@ -63,9 +62,7 @@ TEST(StabilizerMain, ALivelySceneComesOutSmoothWithoutTheTracksThatJump) {
     }
   }
   const solved_clip clip = solve(std::move(global), params_1080p());
-  ASSERT_EQ(clip.result, 1);
-  EXPECT_EQ(spans_of(clip.windows), "0 300;");
-  EXPECT_EQ(spans_of(clip.transitions), "");
+  ASSERT_EQ(spans_of(clip.windows), "0 300;");
   const factorization_window& window = clip.windows.front();
   EXPECT_EQ(window.rank, 9u);
   std::vector<double> rough_in, rough_out;
@@ -84,7 +81,6 @@ TEST(StabilizerMain, ALivelySceneComesOutSmoothWithoutTheTracksThatJump) {
   EXPECT_GT(rough_in.size(), sound * 95 / 100);
   EXPECT_GT(median(rough_in), 5.0);
   EXPECT_LT(median(rough_out), median(rough_in) / 100);
-  EXPECT_TRUE(quality_check(clip.global, window, params_1080p(), 50.0, kNoProgress).passes);
 }
 
 // The blend over the overlap hides the step from one solution to the next.

@@ -32,12 +32,6 @@ boost::shared_ptr<stabilizer_global> rings_clip(int frames, Wanted wanted) {
   return global;
 }
 
-inline std::vector<factorization_window> whole_clip(int frames) {
-  factorization_window window;
-  window.end = frames;
-  return {window};
-}
-
 // A warper with its models decided. homography_limit: what a frame's homography may be off.
 inline boost::shared_ptr<CPWarper> built(
     const boost::shared_ptr<stabilizer_global>& global, float method,
@@ -56,7 +50,7 @@ inline boost::shared_ptr<CPWarper> built(
 
 inline boost::shared_ptr<CPWarper> built(const boost::shared_ptr<stabilizer_global>& global,
                                          float method) {
-  return built(global, method, whole_clip(static_cast<int>(global->frame_count)));
+  return built(global, method, {window_over(0, global->frame_count)});
 }
 
 inline boost::shared_ptr<CPWarper> driven(const boost::shared_ptr<stabilizer_global>& global,

@@ -20,11 +20,8 @@ class ScriptedMaker : public window_maker {
 
   factorization_window make(std::uint64_t first, std::uint64_t limit) override {
     requests.push_back({first, limit});
-    factorization_window window;
-    window.first = first;
-    const std::uint64_t steps = limit < 40 ? limit : 40 + (limit - 40) / 5 * 5;
-    window.end = frames_ - first <= limit ? frames_ : first + steps;
-    return window;
+    const std::uint64_t steps = limit < 40 ? limit : limit / 5 * 5;
+    return window_over(first, frames_ - first <= limit ? frames_ : first + steps);
   }
 
   quality_result check(const factorization_window& window) override {
@@ -46,13 +43,10 @@ class ScriptedMaker : public window_maker {
   range weak_;
 };
 
-struct outcome {
-  std::vector<range> windows, requests;
-};
-
-// no_start: frames from which too few tracks are complete.
-outcome run(std::uint64_t frames, const range& weak, const range& no_start = {},
-            const SolverParamsRecord& parameters = {}) {
+// The windows and the requests for them. no_start: frames from which too few tracks are complete.
+std::pair<std::vector<range>, std::vector<range>> run(std::uint64_t frames, const range& weak,
+                                                      const range& no_start = {},
+                                                      const SolverParamsRecord& parameters = {}) {
   stabilizer_global global;
   global.frame_count = frames;
   std::vector<std::size_t> complete(frames, 5);
@@ -60,9 +54,9 @@ outcome run(std::uint64_t frames, const range& weak, const range& no_start = {},
   ScriptedMaker maker(frames, weak);
   std::vector<factorization_window> windows;
   run_factorization_queue(global, parameters, complete, maker, windows, kNoProgress);
-  outcome found{{}, maker.requests};
-  for (const auto& w : windows) found.windows.push_back({w.first, w.end});
-  return found;
+  std::vector<range> found;
+  for (const auto& w : windows) found.push_back({w.first, w.end});
+  return {found, maker.requests};
 }
 
 TEST(FactorizationQueueTest, WindowsCoverWhatTheirTracksHold) {
@@ -83,17 +77,16 @@ TEST(FactorizationQueueTest, WindowsCoverWhatTheirTracksHold) {
                {"begins where enough are complete", 300, {}, {0, 17}, {{17, 300}}},
                {"which they never are", 300, {}, {0, 300}, {}}};
   for (const auto& e : cases) {
-    EXPECT_EQ(run(e.frames, e.weak, e.no_start).windows, e.windows) << e.situation;
+    EXPECT_EQ(run(e.frames, e.weak, e.no_start).first, e.windows) << e.situation;
   }
 }
 
 TEST(FactorizationQueueTest, ATruncatedWindowIsMadeAgainOnlyIfChecked) {
   // [0, 300) fails on 120; made again over 120 frames; goes on at 140.
-  EXPECT_EQ(run(300, {120, 140}).requests, (std::vector<range>{{0, 301}, {0, 120}, {140, 161}}));
+  EXPECT_EQ(run(300, {120, 140}).second, (std::vector<range>{{0, 301}, {0, 120}, {140, 161}}));
   SolverParamsRecord unchecked;
   unchecked.conservative_factorization = false;
-  EXPECT_EQ(run(400, {120, 140}, {}, unchecked).windows,
-            (std::vector<range>{{0, 300}, {270, 400}}));
+  EXPECT_EQ(run(400, {120, 140}, {}, unchecked).first, (std::vector<range>{{0, 300}, {270, 400}}));
 }
 
 TEST(FactorizationQueueTest, CompleteTrajectoriesCountWhatTheDurationAsks) {

@@ -13,14 +13,11 @@ namespace {
 // A window with every trajectory flagged, rank 1: basis 1 on every frame, coefficients (10, 20).
 struct Fixture {
   Fixture(std::uint64_t frames, std::uint64_t first, std::uint64_t end,
-          const std::vector<Trajectory>& trajectories) {
-    global.frame_count = frames;
-    global.feature_count = trajectories.size();
+          const std::vector<Trajectory>& trajectories)
+      : global(empty_clip(trajectories.size(), frames)), window(window_over(first, end)) {
     global.trajectories = trajectories;
-    global.input.assign(frames * trajectories.size(), {10, 20, 0, 0});
-    global.output.assign(frames * trajectories.size(), {0, 0, -1, -7});
-    window.first = first;
-    window.end = end;
+    for (track_sample& s : global.input) s = {10, 20, 0, 0};
+    for (track_sample& s : global.output) s.error = -7;
     window.rank = 1;
     window.basis.assign(end - first, 1.0);
     for (std::size_t t = 0; t < trajectories.size(); ++t) {

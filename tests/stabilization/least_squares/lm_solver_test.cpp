@@ -148,8 +148,11 @@ struct no_progress {
 };
 
 template <class Progress = no_progress>
-result run(dense_problem& p, vector x, std::int64_t max_iter = 0, Progress progress = {}) {
+result run(
+    dense_problem& p, vector x, std::int64_t max_iter = 0, Progress progress = {},
+    const std::function<void(lm_solver<double>&)>& set_limits = [](auto&) {}) {
   lm_solver<double> solver(static_cast<std::int64_t>(p.m), static_cast<std::int64_t>(p.n));
+  set_limits(solver);
   vector f(p.m);
   solver.solve(p, x.data(), f.data(), max_iter, progress);
   return {solver.info, solver.iter, solver.nfev, solver.njev, x, f};
@@ -227,19 +230,16 @@ TEST(LmSolver, LimitsGoByTheirComparison) {
   const double cosine = 1.0 / std::sqrt(2.0);
   for (const auto& [limit, steps] : {std::pair(cosine, 1), {std::nextafter(cosine, 1.0), 0}}) {
     dense_problem p = {diagonal, 2, 1};
-    lm_solver<double> solver(2, 1);
-    solver.gtol = limit;
-    vector x = {2}, f(2);
-    solver.solve(p, x.data(), f.data(), 1, no_progress());
-    EXPECT_EQ(solver.iter, steps);
+    const double gtol = limit;
+    EXPECT_EQ(run(p, {2}, 1, no_progress(), [=](auto& solver) { solver.gtol = gtol; }).iter, steps);
   }
   dense_problem p = {rosenbrock, 2, 2};
-  lm_solver<double> solver(2, 2);
-  EXPECT_EQ(solver.maxfev, 800);
-  solver.maxfev = 4;
-  vector x = {-1.2, 1}, f(2);
-  EXPECT_EQ(solver.solve(p, x.data(), f.data(), 0, no_progress()), 5);
-  EXPECT_EQ(solver.nfev, 4);
+  const result r = run(p, {-1.2, 1}, 0, no_progress(), [](auto& solver) {
+    EXPECT_EQ(solver.maxfev, 800);
+    solver.maxfev = 4;
+  });
+  EXPECT_EQ(r.info, 5);
+  EXPECT_EQ(r.nfev, 4);
 }
 
 // The counts that MINPACK's lmder takes from the usual start and from ten times it (More,
@@ -255,13 +255,12 @@ TEST(LmSolver, EvaluationsAreThoseOfLmder) {
                {{freudenstein_roth, 2, 2}, {5, -20}, 19, 12}};
   for (const auto& e : cases) {
     dense_problem p = e.problem;
-    lm_solver<double> solver(2, 2);
-    solver.xtol = solver.ftol = std::sqrt(std::numeric_limits<double>::epsilon());
-    solver.gtol = 0;
-    vector x = e.start, f(2);
-    solver.solve(p, x.data(), f.data(), 0, no_progress());
-    EXPECT_EQ(solver.nfev, e.nfev) << e.start[0];
-    EXPECT_EQ(solver.njev, e.njev) << e.start[0];
+    const result r = run(p, e.start, 0, no_progress(), [](auto& solver) {
+      solver.xtol = solver.ftol = std::sqrt(std::numeric_limits<double>::epsilon());
+      solver.gtol = 0;
+    });
+    EXPECT_EQ(r.nfev, e.nfev) << e.start[0];
+    EXPECT_EQ(r.njev, e.njev) << e.start[0];
   }
 }
 

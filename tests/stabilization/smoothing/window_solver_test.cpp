@@ -30,14 +30,11 @@ class WindowSolverTest : public ::testing::Test {
     std::vector<Trajectory> t = {{0, 0, 0, 60},  {1, 0, 15, 34}, {2, 0, 18, 28}, {3, 0, 20, 31},
                                  {4, 0, 22, 60}, {5, 0, 26, 33}, {6, 0, 27, 29}, {7, 0, 10, 40}};
     std::sort(t.begin(), t.end(), [](auto& a, auto& b) { return a.first < b.first; });
+    global_ = empty_clip(8, kFrames);
     global_.trajectories = t;
-    global_.feature_count = 8;
-    global_.frame_count = kFrames;
-    global_.input.resize(8 * kFrames);
-    global_.output.assign(8 * kFrames, {0, 0, -1, 9});
+    for (track_sample& s : global_.output) s.error = 9;
     for (track_sample& s : global_.input) s = {Random(100), Random(100), 0, 0};
-    window_.first = window_.overlap_end = kFirst;
-    window_.end = kFirst + kLength;
+    window_ = window_over(kFirst, kFirst + kLength);
     window_.rank = kRank;
     for (std::size_t i = 0; i < kRank * kLength; ++i) window_.basis.push_back(Random(1));
     for (int k = 1; k <= 8; ++k) {

@@ -57,7 +57,6 @@ template <class Problem>
 void expect_central_differences(Problem& problem, const vector& x) {
   const linearised at(problem, x);
   vector up(at.m), down(at.m), moved = x;
-  std::size_t nonzero = 0;
   for (std::size_t k = 0; k < at.n; ++k) {
     const double h = 1e-6;
     moved[k] = x[k] + h;
@@ -69,10 +68,8 @@ void expect_central_differences(Problem& problem, const vector& x) {
       const double expected = (up[i] - down[i]) / (2 * h);
       EXPECT_NEAR(at.j[i * at.n + k], expected, 1e-6 * (1000 + std::fabs(expected)))
           << "residual " << i << " unknown " << k;
-      nonzero += expected != 0;
     }
   }
-  EXPECT_GT(nonzero, at.m);
 }
 
 // Every operation of the problem against the dense J.

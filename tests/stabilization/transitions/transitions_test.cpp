@@ -131,7 +131,8 @@ TEST(TransitionWindow, RecordsCoverTheStretch) {
     int count, first, last;
   };
   using clip = std::vector<lives>;
-  const clip hole = {{8, 0, 25}, {8, 35, 60}}, long_hole = {{8, 5, 40}, {8, 90, 120}};
+  const clip whole = {{12, 0, 130}}, hole = {{8, 0, 25}, {8, 35, 60}},
+             long_hole = {{8, 5, 40}, {8, 90, 120}};
   // Two tracks of two frames: eight residuals for eight unknowns would do, but not with ten frames
   // of overlap behind a hole.
   const clip brief = {{2, 0, 2}}, brief_behind = {{2, 30, 32}, {8, 40, 60}};
@@ -141,24 +142,19 @@ TEST(TransitionWindow, RecordsCoverTheStretch) {
     clip tracks;
     bool old_too;
     const char* records;
-  } cases[] = {{"no frames", 10, 200, 10, {{4, 0, 10}}, true, ""},
-               {"no tracks", 12, 200, 0, {}, true, "unsolved 0 12;"},
-               {"one track", 12, 200, 0, {{1, 0, 12}}, false, "unsolved 0 12;"},
-               {"a hole", 60, 200, 0, hole, true, "solved 0 25;unsolved 25 35;solved 35 60;"},
-               {"a hole longer than a chunk ends it", 120, 20, 0, long_hole, false,
-                "unsolved 0 5;solved 5 20;solved 20 40;unsolved 40 120;"},
-               {"chunks",
-                130,
-                40,
-                0,
-                {{12, 0, 130}},
-                true,
-                "solved 0 40;solved 40 80;solved 80 120;solved 120 130;"},
-               {"chunks of one frame", 10, 1, 0, {{6, 0, 10}}, false, "unsolved 0 10;"},
-               {"less than none", 10, -5, 0, {{6, 0, 10}}, false, "unsolved 0 10;"},
-               {"just enough residuals", 10, 200, 0, brief, false, "solved 0 2;unsolved 2 10;"},
-               {"too few residuals", 60, 200, 20, brief_behind, false,
-                "unsolved 20 30;unsolved 30 32;unsolved 32 40;solved 40 60;"}};
+  } cases[] = {
+      {"no frames", 10, 200, 10, {{4, 0, 10}}, true, ""},
+      {"no tracks", 12, 200, 0, {}, true, "unsolved 0 12;"},
+      {"one track", 12, 200, 0, {{1, 0, 12}}, false, "unsolved 0 12;"},
+      {"a hole", 60, 200, 0, hole, true, "solved 0 25;unsolved 25 35;solved 35 60;"},
+      {"a hole longer than a chunk ends it", 120, 20, 0, long_hole, false,
+       "unsolved 0 5;solved 5 20;solved 20 40;unsolved 40 120;"},
+      {"chunks", 130, 40, 0, whole, true, "solved 0 40;solved 40 80;solved 80 120;solved 120 130;"},
+      {"chunks of one frame", 10, 1, 0, {{6, 0, 10}}, false, "unsolved 0 10;"},
+      {"less than none", 10, -5, 0, {{6, 0, 10}}, false, "unsolved 0 10;"},
+      {"just enough residuals", 10, 200, 0, brief, false, "solved 0 2;unsolved 2 10;"},
+      {"too few residuals", 60, 200, 20, brief_behind, false,
+       "unsolved 20 30;unsolved 30 32;unsolved 32 40;solved 40 60;"}};
   for (const auto& e : cases) {
     for (int use_new = !e.old_too; use_new < 2; ++use_new) {
       SCOPED_TRACE(e.situation);

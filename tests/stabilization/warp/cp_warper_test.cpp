@@ -104,7 +104,9 @@ TEST(CPWarperTest, AScoreBetweenTwoModelsBlendsThem) {
   EXPECT_GT(apart, 0.1);
   EXPECT_EQ(built(waving, 9)->modelScore(0), 4.0);  // there is none beyond
   // What is stored is what a saved project would give back.
-  EXPECT_EQ(rebuild(quantise(solved), solved.cols, solved.rows).values, solved.values);
+  for (const VarVector& grid : {base, solved, blend}) {
+    EXPECT_EQ(rebuild(quantise(grid), grid.cols, grid.rows).values, grid.values);
+  }
 }
 
 TEST(CPWarperTest, TransitionFramesTakeTheirStoredMotion) {
@@ -117,10 +119,8 @@ TEST(CPWarperTest, TransitionFramesTakeTheirStoredMotion) {
     const double* m = &record.motion[4 * (f - 3)];
     return transform(similarity_matrix(m[0], m[1], m[2], m[3]), p);
   });
-  std::vector<factorization_window> windows(2);
-  windows[0].end = 3;
-  windows[1].first = 5;  // frame 5 is covered as well and stays a window's frame
-  windows[1].end = 20;
+  // Frame 5 is covered as well and stays a window's frame.
+  const std::vector<factorization_window> windows = {window_over(0, 3), window_over(5, 20)};
   const auto shift = built(global, 1, windows, {record}),
              homography = built(global, 3, windows, {record});
   EXPECT_EQ(shift->modelScore(4), 1);
@@ -168,7 +168,7 @@ TEST(CPWarperTest, AFrameWhoseTracksDisagreeBecomesASimilarityAndItsNeighboursRa
       const double to = f == 50 ? apart : 0;
       return point2{p.x + ((p.x > 960) == (p.y > 540) ? to : -to), p.y};
     });
-    const auto warper = built(global, 4, whole_clip(120), {}, 1e9f);
+    const auto warper = built(global, 4, {window_over(0, 120)}, {}, 1e9f);
     std::vector<double> found;
     for (const int f : {50, 51, 36, 35, 65, 20, 19}) found.push_back(warper->modelScore(f));
     return found;
@@ -236,11 +236,11 @@ TEST(FrameBoundsTest, TheOuterRingsAndTheirUnion) {
 TEST(CPWarperForWindowsTest, ProjectsTheFramesOwnMotionOverEveryLiveSource) {
   const matrix3 motion = similarity_matrix(1.05, .02, 30, -20);
   const auto global = clip_of(12, 80, under(motion));
-  std::vector<factorization_window> windows = whole_clip(80);
-  windows[0].trajectory_flags.assign(12, 1);
-  windows[0].trajectory_flags[11] = 0;  // not a member: projected all the same
+  factorization_window window = window_over(0, 80);
+  window.trajectory_flags.assign(12, 1);
+  window.trajectory_flags[11] = 0;  // not a member: projected all the same
   CPWarper warper(80, kWidth, kHeight);
-  warper.buildDisplacementsForWindows(*global, windows, {});
+  warper.buildDisplacementsForWindows(*global, {window}, {});
   for (int f = 0; f < 80; ++f) global->output_at(f, 5).status = -1;  // dropped by the prune
   global->output_at(79, 3).x += 300;                                 // outlier
   warper.pruneDisplacements(79);

@@ -16,8 +16,16 @@ boost::shared_ptr<stabilizer_global> panning(int tracks, int frames) {
   return global;
 }
 
-TEST(FrameMapTest, APairForEveryNeighbourWithinTheRadius) {
-  auto warper = driven(panning(20, 9), 2);
+TEST(FrameMapTest, APairForEveryNeighbourWithinTheRadiusOnceDriven) {
+  auto warper = built(panning(20, 9), 2);
+  matrix3 m;
+  std::vector<double> from_tracks, from_map;
+  EXPECT_THROW(warper->alignFrameMtoN(0, 1, m), std::runtime_error);
+  EXPECT_FALSE(warper->warpedGridOfFrame(0, 1, from_map));
+  warper->drive(kNoProgress);
+  EXPECT_FALSE(warper->alignFrameMtoN(8, 9, m));
+  ASSERT_TRUE(warper->warpedGridOfFrame(2, 1, from_tracks));
+
   warper->makeFrameMap(2);
   const MtoNMap& map = *warper->frameMap();
   EXPECT_EQ(map.entries().size(), 2u * (8 + 7));
@@ -25,6 +33,10 @@ TEST(FrameMapTest, APairForEveryNeighbourWithinTheRadius) {
     EXPECT_NEAR(motion[2], -3 * pair.first, 2e-3);
     EXPECT_NEAR(motion[0], 1, 1e-5);
   }
+  EXPECT_FALSE(warper->warpedGridOfFrame(4, 1, from_map));
+  ASSERT_TRUE(warper->warpedGridOfFrame(2, 1, from_map));
+  EXPECT_EQ(from_tracks, from_map);
+  expect_point_near({from_map[4606], from_map[4607]}, {1919 - 6, 1079}, 2e-2);
   EXPECT_THROW(warper->makeFrameMap(1, [] { throw 5; }), int);
   EXPECT_EQ(warper->frameMap().get(), &map) << "stays as it was";
 }
@@ -95,7 +107,7 @@ TEST(FrameMapTest, AHomographyFarFromTheSimilarityFallsBackToIt) {
     });
     // Of a frame's own model it decides too.
     EXPECT_EQ(built(global, 3)->modelScore(1), off < 50 ? 3 : 2);
-    const auto warper = built(global, 3, whole_clip(2), {}, 1e9f);
+    const auto warper = built(global, 3, {window_over(0, 2)}, {}, 1e9f);
     warper->drive(kNoProgress);
     matrix3 m;
     ASSERT_TRUE(warper->alignFrameMtoN(0, 1, m));
@@ -117,24 +129,6 @@ TEST(FrameMapTest, AStrongElationFallsBackToTheSimilarity) {
     ASSERT_TRUE(driven(global, 3)->alignFrameMtoN(0, 1, m));
     EXPECT_NEAR(m[6], elation < 2e-4 ? elation : 0, 2e-6);
   }
-}
-
-TEST(FrameMapTest, NeedsADrivenWarperAndGivesGridsOfNeighbours) {
-  auto warper = built(panning(20, 4), 2);
-  matrix3 m;
-  std::vector<double> from_tracks, from_map;
-  EXPECT_THROW(warper->alignFrameMtoN(0, 1, m), std::runtime_error);
-  EXPECT_FALSE(warper->warpedGridOfFrame(0, 1, from_map));
-  warper->drive([] {});
-  EXPECT_FALSE(warper->alignFrameMtoN(3, 4, m));
-  ASSERT_TRUE(warper->warpedGridOfFrame(2, 1, from_tracks));
-  warper->makeFrameMap(1);
-  ASSERT_TRUE(warper->warpedGridOfFrame(2, 1, from_map));
-  EXPECT_EQ(from_tracks, from_map);
-  const std::size_t last = 2 * (36 * 64 - 1);
-  EXPECT_NEAR(from_map[last], 1919 - 6, 2e-2);
-  EXPECT_NEAR(from_map[last + 1], 1079, 2e-2);
-  EXPECT_FALSE(warper->warpedGridOfFrame(3, 1, from_map));
 }
 
 }  // namespace
