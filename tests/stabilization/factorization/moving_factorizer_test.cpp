@@ -56,12 +56,12 @@ struct factorization {
 };
 
 // x stands 300 pixels off the centre and y goes to and fro by 40: of rank 1 the first is kept, and
-// 40^2 a sample are left by the first window, by the frames that it moves over, and by a track that
-// is complete from the second position on.
+// 40^2 a sample are left by the first window, by the frames that it moves over, and by two tracks
+// that are complete from the second position on.
 TEST(MovingFactorizerTest, WhatLiesBeyondTheRankIsLeft) {
   stabilizer_global global = empty_clip(4, 28);
   for (int s = 0; s < 4; ++s) {
-    put_track(global, s, s < 3 ? 0 : 4, 28, [](int f) {
+    put_track(global, s, s < 2 ? 0 : 4, 28, [](int f) {
       return point2{kCenterX + 300, kCenterY + (f % 2 ? 40 : -40)};
     });
   }
@@ -122,6 +122,8 @@ TEST(MovingFactorizerTest, WhereAWindowEnds) {
   const stabilizer_global fading = clip_of(200, {{0, 200}, {0, 101}, {0, 101}, {0, 101}});
   EXPECT_EQ(factorization(fading, 4, 0, 300).end(), 100);
   EXPECT_EQ(factorization(fading, 4, 150, 300).end(), 150);  // empty
+  const stabilizer_global enough = clip_of(200, {{0, 200}, {0, 200}, {0, 101}});
+  EXPECT_EQ(factorization(enough, 4, 0, 300).end(), 200);
 }
 
 TEST(MovingFactorizerTest, AStretchShorterThanTheRankHasNoTracks) {

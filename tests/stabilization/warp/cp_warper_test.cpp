@@ -195,19 +195,19 @@ TEST(CPWarperTest, AnOutlierWeighsItsTrackDownForSixtyFrames) {
   }
 }
 
-// Its model is the least, and those of the frames about it rise from there, 15 for each step.
+// Its model is the least, and those of the frames before it rise from there, 15 for each step.
 TEST(CPWarperTest, AFrameWithoutTracksHasNoPlace) {
   auto global = clip_of(60, 50, under(kShift));
   for (int s = 0; s < 60; ++s) {
-    global->trajectories[s].first = 1;
-    global->output_at(0, s).status = -1;
+    global->trajectories[s].last = 49;
+    global->output_at(49, s).status = -1;
   }
   const auto warper = driven(global, 4);
-  const std::pair<int, double> scores[] = {{0, 1}, {1, 1 + 1 / 15.}, {44, 1 + 44 / 15.}, {45, 4}};
+  const std::pair<int, double> scores[] = {{49, 1}, {48, 1 + 1 / 15.}, {5, 1 + 44 / 15.}, {4, 4}};
   for (const auto& [frame, score] : scores) EXPECT_NEAR(warper->modelScore(frame), score, 1e-12);
-  EXPECT_TRUE(std::isnan(warper->frameWarp(0)->values[0]));
-  EXPECT_GT(warper->frameBounds(0).min_x, 1e38);
-  EXPECT_LT(warper->frameBounds(0).max_x, 1e-37);
+  EXPECT_TRUE(std::isnan(warper->frameWarp(49)->values[0]));
+  EXPECT_GT(warper->frameBounds(49).min_x, 1e38);
+  EXPECT_LT(warper->frameBounds(49).max_x, 1e-37);
   EXPECT_TRUE(warper->boundsEmpty());
 }
 
