@@ -82,6 +82,14 @@ inline stabilizer_global empty_clip(std::size_t slots, std::size_t frames) {
   return global;
 }
 
+// A window of no overlap.
+inline factorization_window window_over(std::uint64_t first, std::uint64_t end) {
+  factorization_window window;
+  window.first = window.overlap_end = first;
+  window.end = end;
+  return window;
+}
+
 // Puts samples into the slot over [first, end); at(frame) tells where the track is.
 template <class At>
 void put_track(stabilizer_global& global, std::size_t slot, int first, int end, At at) {
@@ -134,6 +142,18 @@ inline std::string spans_of(const std::vector<transition_record>& records) {
     EXPECT_EQ(r.motion.size(), 4 * (r.end - r.first));
   }
   return text;
+}
+
+// The motion of what is unsolved is the identity, and no track has a place there.
+inline void expect_unsolved_untouched(const stabilizer_global& global,
+                                      const std::vector<transition_record>& records) {
+  for (const transition_record& r : records) {
+    if (r.kind == transition_record::solved) continue;
+    for (std::size_t k = 0; k < r.motion.size(); ++k) ASSERT_EQ(r.motion[k], k % 4 == 0);
+    for (std::size_t i = r.first * global.feature_count; i < r.end * global.feature_count; ++i) {
+      ASSERT_EQ(global.output[i].status, -1);
+    }
+  }
 }
 
 // Points all over a 1080p frame, at least 100 pixels inside.

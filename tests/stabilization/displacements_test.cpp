@@ -4,28 +4,50 @@
 
 #include <functional>
 
+#include "stabilization/fade_weight.h"
 #include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
 
+// Tracks over [first, last) of a clip, in flanks of 100 frames, those under 5 frames dropped.
+TEST(FadeWeight, TracksRiseAndFallUnlessTheClipCutsThem) {
+  const struct {
+    int first, last, frames;
+    std::vector<std::pair<int, double>> weights;  // of frames
+  } tracks[] = {
+      {0, 300, 300, {{0, 1}, {150, 1}, {299, 1}}},
+      {0, 150, 150, {{0, .75}, {149, .75}}},
+      {0, 99, 300, {{0, .99}, {50, .49}, {98, .01}}},
+      {0, 100, 300, {{0, .5}, {49, .5}, {50, .5}, {51, .49}, {99, .01}}},
+      {0, 101, 300, {{0, .505}, {50, .505}, {100, .01}}},
+      {250, 300, 300, {{250, .01}, {274, .25}, {299, .5}}},
+      {10, 15, 300, {{10, .01}, {11, .02}, {12, .025}, {13, .02}, {14, .01}}},
+      {10, 16, 300, {{10, .01}, {12, .03}, {13, .03}, {15, .01}}},
+      {10, 14, 300, {{10, 0}, {12, 0}}},
+      {50, 350, 1000, {{50, .01}, {148, .99}, {149, 1}, {250, 1}, {251, .99}, {349, .01}}}};
+  for (const auto& t : tracks) {
+    for (const auto& [frame, weight] : t.weights) {
+      EXPECT_NEAR(fade_weight(t.first, t.last, t.frames, frame, 100, 5), weight, 1e-12)
+          << t.first << " to " << t.last << ", frame " << frame;
+    }
+  }
+  EXPECT_EQ(fade_weight({7, false, false}, 3, 0), 1.0);  // no flanks
+}
+
 const auto shifted = [](int, point2 p) { return point2{p.x + 10, p.y - 5}; };
 
 // Of a slot: 100 pixels from its neighbours, moving by a pixel a frame.
 void add_moving(stabilizer_global& global, int slot, int first, int last) {
-  add_track(
-      global, slot, first, last,
-      [slot](int f) {
-        return point2{100.0 * slot + f, 2.0 * f};
-      },
-      shifted);
+  const auto at = [slot](int f) { return point2{100.0 * slot + f, 2.0 * f}; };
+  add_track(global, slot, first, last, at, shifted);
 }
 
 // Each track has a record, linked to its neighbours and off its source by shift(frame), on exactly
 // the frames where alive(frame, slot).
-void expect_lists(const displacement_lists& lists, int slots,
-                  const std::function<bool(int, int)>& alive,
-                  const std::function<double(int)>& shift) {
+void expect_lists(
+    const displacement_lists& lists, int slots, const std::function<bool(int, int)>& alive,
+    const std::function<double(int)>& shift = [](int) { return 10; }) {
   const int frames = static_cast<int>(lists.size());
   for (int f = 0; f < frames; ++f) {
     std::vector<int> records(slots);
@@ -50,10 +72,8 @@ TEST(BlendedDisplacementsTest, LinksFollowATrackThroughListsOfDifferentLength) {
   const int lives[][2] = {{0, 8}, {0, 20}, {6, 20}, {9, 13}, {10, 15}};  // the fourth is too short
   stabilizer_global global = empty_clip(5, 20);
   for (int s = 0; s < 5; ++s) add_moving(global, s, lives[s][0], lives[s][1]);
-  expect_lists(
-      blended_displacements(global, {}, {}), 5,
-      [&](int f, int s) { return s != 3 && f >= lives[s][0] && f < lives[s][1]; },
-      [](int) { return 10; });
+  expect_lists(blended_displacements(global, {}, {}), 5,
+               [&](int f, int s) { return s != 3 && f >= lives[s][0] && f < lives[s][1]; });
 }
 
 TEST(BlendedDisplacementsTest, TracksAreCutToTheirStabilizedSamplesAndFadeFromTheCut) {
@@ -61,17 +81,14 @@ TEST(BlendedDisplacementsTest, TracksAreCutToTheirStabilizedSamplesAndFadeFromTh
   add_moving(global, 0, 10, 90);
   for (const int f : {10, 11, 40}) global.output_at(f, 0).status = -1;
   const displacement_lists lists = blended_displacements(global, {}, {});
-  expect_lists(
-      lists, 1, [](int f, int) { return f >= 12 && f < 40; }, [](int) { return 10; });
+  expect_lists(lists, 1, [](int f, int) { return f >= 12 && f < 40; });
   EXPECT_NEAR(lists[12][0].weight, 0.01, 1e-15);
   EXPECT_NEAR(lists[25][0].weight, 0.14, 1e-15);
 }
 
 // Window [40, 100) whose first 30 frames had been solved before, 8 pixels to the right.
 factorization_window overlapping(const stabilizer_global& global) {
-  factorization_window window;
-  window.first = 40;
-  window.end = 100;
+  factorization_window window = window_over(40, 100);
   window.overlap_end = 70;
   window.overlap_rows.assign(global.output.begin() + 40 * global.feature_count,
                              global.output.begin() + 70 * global.feature_count);
@@ -81,19 +98,13 @@ factorization_window overlapping(const stabilizer_global& global) {
 
 TEST(BlendedDisplacementsTest, AWindowsStartMovesFromTheOldSolutionToTheNew) {
   stabilizer_global global = empty_clip(1, 100);
-  add_track(
-      global, 0, 0, 100,
-      [](int) {
-        return point2{0, 0};
-      },
-      shifted);
+  add_still(global, 0, 0, 100, {0, 0}, shifted);
   const factorization_window window = overlapping(global);
   global.output_at(60, 0).status = -1;  // held by the old solution alone
   const displacement_lists lists = blended_displacements(global, {window}, {});
-  const double expected[][2] = {{0, .967742}, {1, .935484}, {15, .483871}, {29, .032258}};
-  for (const auto& [f, t] : expected) {
-    EXPECT_NEAR(lists[40 + static_cast<int>(f)][0].targetX, 10 + 8 * t, 1e-5);
-    EXPECT_EQ(lists[40 + static_cast<int>(f)][0].weight, .5);  // as its span is as long as a flank
+  for (const auto& [f, t] : {std::pair(40, .967742), {55, .483871}, {69, .032258}}) {
+    EXPECT_NEAR(lists[f][0].targetX, 10 + 8 * t, 1e-5);
+    EXPECT_EQ(lists[f][0].weight, .5);  // as its span is as long as a flank
   }
   EXPECT_EQ(lists[39][0].targetX, 10);
   EXPECT_EQ(lists[70][0].targetX, 10);
@@ -116,18 +127,11 @@ TEST(MemberDisplacementsTest, TracksRunAsLongAsTheirWindowsListThem) {
   stabilizer_global global = empty_clip(3, 120);
   for (int s = 0; s < 3; ++s) add_moving(global, s, 0, 120);
   for (track_sample& sample : global.output) sample.status = -1;  // nothing solved yet
-  std::vector<factorization_window> windows(2);
-  windows[0].first = 10;
-  windows[0].end = 60;
-  windows[0].trajectory_flags = {1, 1};
-  windows[1].first = 50;
-  windows[1].end = 100;
+  std::vector<factorization_window> windows = {window_over(10, 60), window_over(50, 100)};
+  for (factorization_window& window : windows) window.trajectory_flags = {1, 1};
   windows[1].trajectories_begin = 1;
-  windows[1].trajectory_flags = {1, 1};
-  expect_lists(
-      member_displacements(global, windows, {}), 3,
-      [](int f, int s) { return f >= (s == 2 ? 50 : 10) && f < (s == 0 ? 50 : 100); },
-      [](int) { return 10; });
+  expect_lists(member_displacements(global, windows, {}), 3,
+               [](int f, int s) { return f >= (s == 2 ? 50 : 10) && f < (s == 0 ? 50 : 100); });
 }
 
 TEST(RefreshTargetsTest, DroppedRecordsLeaveAllLinksRight) {

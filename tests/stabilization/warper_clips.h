@@ -15,11 +15,8 @@ template <class Wanted>
 boost::shared_ptr<stabilizer_global> clip_of(int tracks, int frames, Wanted wanted) {
   auto global = boost::make_shared<stabilizer_global>(empty_clip(tracks, frames));
   std::mt19937 random(11);
-  std::uniform_real_distribution<double> unit(0, 1);
-  for (int s = 0; s < tracks; ++s) {
-    const point2 p = {unit(random) * (kWidth - 1), unit(random) * (kHeight - 1)};
-    add_still(*global, s, 0, frames, p, wanted);
-  }
+  std::uniform_real_distribution<double> x(0, kWidth - 1), y(0, kHeight - 1);
+  for (int s = 0; s < tracks; ++s) add_still(*global, s, 0, frames, {x(random), y(random)}, wanted);
   return global;
 }
 
@@ -33,12 +30,6 @@ boost::shared_ptr<stabilizer_global> rings_clip(int frames, Wanted wanted) {
     add_still(*global, s, 0, frames, p, wanted);
   }
   return global;
-}
-
-inline std::vector<factorization_window> whole_clip(int frames) {
-  factorization_window window;
-  window.end = frames;
-  return {window};
 }
 
 // A warper with its models decided. homography_limit: what a frame's homography may be off.
@@ -59,7 +50,7 @@ inline boost::shared_ptr<CPWarper> built(
 
 inline boost::shared_ptr<CPWarper> built(const boost::shared_ptr<stabilizer_global>& global,
                                          float method) {
-  return built(global, method, whole_clip(static_cast<int>(global->frame_count)));
+  return built(global, method, {window_over(0, global->frame_count)});
 }
 
 inline boost::shared_ptr<CPWarper> driven(const boost::shared_ptr<stabilizer_global>& global,

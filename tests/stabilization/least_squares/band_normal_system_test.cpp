@@ -26,9 +26,8 @@ struct gram {
     for (std::size_t start = 0; start + width <= n; ++start) {
       for (int r = 0; r < rows_per_start; ++r) {
         std::vector<std::pair<std::size_t, double>> row;
-        for (std::size_t k = start; k < start + width; ++k) row.push_back({k, normal(random)});
-        for (auto& [k, c] : row) {
-          if (std::count(unseen.begin(), unseen.end(), k)) c = 0;
+        for (std::size_t k = start; k < start + width; ++k) {
+          row.push_back({k, normal(random) * !std::count(unseen.begin(), unseen.end(), k)});
         }
         dense.add(1, row, normal(random));
       }
@@ -64,16 +63,13 @@ void expect_dense_solution(gram& g, bool by_cholesky, std::size_t rank, double t
 }
 
 TEST(BandNormalSystem, AgreesWithTheDenseMinimumNormSolution) {
-  gram full(60, 12, 3);
-  expect_dense_solution(full, true, 60, 1e-9);
-
   gram unseen(40, 12, 3, {0, 1, 2, 3, 17, 39});
   unseen.dense.right[2] = 5;  // outside the range: dropped, as by the pseudo-inverse
   expect_dense_solution(unseen, true, 34, 1e-9);
 
   gram scaled(20, 4, 4);  // badly, but short of the rank limit
-  for (std::size_t i = 0; i < 20; ++i) {
-    for (std::size_t j = 0; j < 20; ++j) scaled.at(i, j) *= (i % 4 ? 1 : 1e5) * (j % 4 ? 1.0 : 1e5);
+  for (std::size_t i = 0; i < 400; ++i) {
+    scaled.dense.matrix[i] *= (i / 20 % 4 ? 1 : 1e5) * (i % 4 ? 1.0 : 1e5);
   }
   expect_dense_solution(scaled, true, 20, 1e-4);
 
@@ -91,27 +87,26 @@ TEST(BandNormalSystem, LargeSingularSystemIsSolvedInItsRange) {
   system.resize(n, 1);
   // A free chain: differences alone are seen, so a common shift is not.
   vector b(n);
-  const auto truth = [](std::size_t i) { return std::sin(0.1 * static_cast<double>(i)); };
+  const auto step = [](std::size_t i) { return std::sin(0.1 * static_cast<double>(i)); };
   for (std::size_t i = 0; i + 1 < n; ++i) {
     if (i == n / 2) continue;
     system.at(i, i) += 1;
     system.at(i + 1, i + 1) += 1;
     system.at(i + 1, i) -= 1;
-    b[i] += truth(i) - truth(i + 1);
-    b[i + 1] += truth(i + 1) - truth(i);
+    b[i] -= step(i);
+    b[i + 1] += step(i);
   }
   ASSERT_TRUE(system.factorize());
   EXPECT_EQ(system.rank(), n - 1);
   system.solve(b.data());
   for (std::size_t i = 0; i + 1 < n; ++i) {
     if (i == n / 2) continue;
-    EXPECT_NEAR(b[i + 1] - b[i], truth(i + 1) - truth(i), 1e-6) << i;
+    EXPECT_NEAR(b[i + 1] - b[i], step(i), 1e-6) << i;
   }
 }
 
 TEST(BandNormalSystem, NonFiniteEntriesAreAFailure) {
-  for (const double bad :
-       {std::numeric_limits<double>::quiet_NaN(), std::numeric_limits<double>::infinity()}) {
+  for (const double bad : {std::nan(""), std::numeric_limits<double>::infinity()}) {
     band_normal_system system = gram(12, 4, 2).system();
     system.at(5, 4) = bad;
     EXPECT_FALSE(system.factorize());
