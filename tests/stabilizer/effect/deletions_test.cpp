@@ -100,37 +100,12 @@ TEST_F(DeletionsTest, WhatIsDeletedWasNeverThereAndUndoIsExact) {
   EXPECT_EQ(Runs(), "factorization crop ");
   EXPECT_EQ(Warps(), first);
   EXPECT_EQ(StatusOf(kScene), 1) << "the analysis' own cells";
+  hosted.SetDeletions({std::uint64_t{kFrames} << 32, 9999});
+  EXPECT_EQ(Runs(), "factorization crop ") << "unknown points have a solve of their own";
+  EXPECT_EQ(Warps(), first);
+  hosted.SetDeletions({});
   SolveTracks(false);
   EXPECT_EQ(Warps(), without);
-}
-
-TEST_F(DeletionsTest, WhileItIsSolvedFramesShowTheInputUnderAFaintBanner) {
-  hosted.HoldSolve();
-  hosted.SetDeletions(Walker());
-  hosted.TickUntilHeld();
-  const RenderedFrame frame = hosted.Render(0);
-  ASSERT_TRUE(frame.pixels);
-  // Over grey, stripes of (0.8, 0.333, 0) and four fifths of that, a fifth opaque.
-  double darkest = 1, brightest = 0;
-  for (int x = 1; x < 100; x += 3) {  // left of the text
-    const double red = ChannelAt(*frame.pixels, x, 156, 1);
-    darkest = std::min(darkest, red);
-    brightest = std::max(brightest, red);
-    EXPECT_NEAR(ChannelAt(*frame.pixels, x, 156, 2), 0.4 + (red - 0.4) / 2.4, 0.005);
-    EXPECT_NEAR(ChannelAt(*frame.pixels, x, 156, 3), 0.4, 0.004);
-    EXPECT_NEAR(ChannelAt(*frame.pixels, x, 20, 1), 0.5, 0.003);
-  }
-  EXPECT_NEAR(brightest, 0.56, 0.004);
-  EXPECT_NEAR(darkest, 0.528, 0.004);
-}
-
-TEST_F(DeletionsTest, UnknownPointsChangeNothingButAreSolvedOnce) {
-  hosted.SetDeletions({std::uint64_t{kFrames} << 32, 9999});
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(Runs(), "factorization crop ") << "a solve of its own";
-  EXPECT_EQ(Warps(), first);
-  EXPECT_EQ(StatusOf(kScene), 1);
 }
 
 TEST_F(DeletionsTest, AChangeDuringASolveStartsAnotherAndASetBackKeepsTheWarps) {

@@ -95,17 +95,8 @@ TEST_F(RenderServiceTest, EdgesAreFilledFromTheFramesAround) {
     // Column 30 of the plane shows source 30 - 6 + 6 of frame 2, less half a pixel.
     ExpectShown(*middle, 30 - 8, 20 - 3, 29.5, 20 - 4 - 3 - 0.5);
     // Right of its 57 (and the border's two pixels) frame 3 comes first.
-    for (const int x : {66, 79}) {
-      ExpectShown(*middle, x - 8, 20 - 3, x - 6 - 12 - 0.5, 20 - 4 + 4 - 0.5);
-    }
-    // Above its 3, too: frame 3 begins at -4.
-    EXPECT_NEAR(100 * ChannelAt(*middle, 30 - 8, 3 - 3, 2), 3 - 0.5, 0.4);
+    ExpectShown(*middle, 79 - 8, 20 - 3, 79 - 6 - 12 - 0.5, 20 - 4 + 4 - 0.5);
     EXPECT_EQ(ChannelAt(*middle, 0 - 8, 1 - 3, 0), 0) << "no frame reaches there";
-    // The first and the last frame have neighbours on one side: frames 1 and 3.
-    for (const auto& [frame, shift] : {std::pair{0, 6}, {4, 12}}) {
-      const auto end = DrawBoth(Whole(frame, depth));
-      EXPECT_NEAR(100 * ChannelAt(*end, 73 - 8, 20 - 3, 1), 73 - 6 - shift - 0.5, 0.4);
-    }
   }
 }
 
@@ -123,8 +114,6 @@ TEST_F(RenderServiceTest, FeatherAndCropsFollowTheScaleAndTheBoostIsItsDefault) 
   const auto half = DrawBoth(Whole(0, 8, 2));
   EXPECT_EQ(ChannelAt(*half, 20, 4, 0), 0);
   EXPECT_EQ(ChannelAt(*half, 20, 5, 0), 1);
-  EXPECT_EQ(ChannelAt(*half, 1, 12, 0), 0);
-  EXPECT_EQ(ChannelAt(*half, 2, 12, 0), 1);
   // Feathered: at the outermost pixel 5 times the middle of 2 / 11^2 and 8 / 11^2.
   for (const std::int32_t index : {kSynthesisTop, kSynthesisLeft}) hosted().Set(index, 0);
   hosted().Set(kSynthesisEdgeFeather, 10);
