@@ -108,18 +108,21 @@ TEST_F(DeletionsTest, WhatIsDeletedWasNeverThereAndUndoIsExact) {
   EXPECT_EQ(Warps(), without);
 }
 
-TEST_F(DeletionsTest, AChangeDuringASolveStartsAnotherAndASetBackKeepsTheWarps) {
-  hosted.HoldSolve();
-  hosted.SetDeletions(Walker());
-  hosted.TickUntilHeld();
-  hosted.SetDeletions({});
-  {
-    const std::jthread release = hosted.ReleaseSoon();
-    EXPECT_TRUE(hosted.Tick().ok());
+// Set back, the warps stay; saved, it is solved again.
+TEST_F(DeletionsTest, AChangeOrASaveDuringASolve) {
+  for (const bool saves : {false, true}) {
+    hosted.HoldSolve();
+    hosted.SetDeletions(Walker());
+    hosted.TickUntilHeld();
+    if (!saves) hosted.SetDeletions({});
+    {
+      const std::jthread release = hosted.ReleaseSoon();
+      saves ? void(hosted.Save()) : void(hosted.Tick());
+    }
+    EXPECT_EQ(hosted.Settle(), 8);
+    EXPECT_EQ(Warps() == first, !saves);
+    EXPECT_EQ(StatusOf(kScene), saves ? kDeleted : 1);
   }
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(Warps(), first);
-  EXPECT_EQ(StatusOf(kScene), 1);
 }
 
 TEST_F(DeletionsTest, WithoutAnyTrackTheClipRestsUntilTheyComeBack) {
@@ -147,19 +150,6 @@ TEST_F(DeletionsTest, AProjectKnowsWhatItsSolveLeftOut) {
   EXPECT_EQ(hosted.Settle(), 8);
   EXPECT_NE(Warps(), loaded);
   EXPECT_EQ(StatusOf(kScene), 1);
-}
-
-TEST_F(DeletionsTest, AProjectSavedDuringTheSolveSolvesItAgain) {
-  hosted.HoldSolve();
-  hosted.SetDeletions(Walker());
-  hosted.TickUntilHeld();
-  {
-    const std::jthread release = hosted.ReleaseSoon();
-    hosted.Save();
-  }
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(StatusOf(kScene), kDeleted);
-  EXPECT_NE(Warps(), first);
 }
 
 TEST_F(DeletionsTest, AnalyzeForgetsThem) {

@@ -69,17 +69,15 @@ TEST_F(RenderServiceTest, DrawsTheWarpAtEveryDepthOnBothPaths) {
       // The outline, in the output's pixels.
       const std::vector<float> outline = hosted().effect().shared()->PolygonOf(frame);
       ASSERT_GE(outline.size(), 8u);
-      double left = 1e9, top = 1e9, right = -1e9, bottom = -1e9;
-      for (std::size_t i = 0; i < outline.size(); i += 2) {
-        left = std::min<double>(left, outline[i]);
-        right = std::max<double>(right, outline[i]);
-        top = std::min<double>(top, outline[i + 1]);
-        bottom = std::max<double>(bottom, outline[i + 1]);
+      for (const int axis : {0, 1}) {
+        double least = 1e9, most = -1e9;
+        for (std::size_t i = axis; i < outline.size(); i += 2) {
+          least = std::min<double>(least, outline[i]);
+          most = std::max<double>(most, outline[i]);
+        }
+        EXPECT_NEAR(least, (axis ? 6 : 10) * frame, 0.6);
+        EXPECT_NEAR(most, axis ? 47 + 6 * frame : 63 + 10 * frame, 0.6);
       }
-      EXPECT_NEAR(left, 10 * frame, 0.6);
-      EXPECT_NEAR(top, 6 * frame, 0.6);
-      EXPECT_NEAR(right, 63 + 10 * frame, 0.6);
-      EXPECT_NEAR(bottom, 47 + 6 * frame, 0.6);
     }
   }
 }

@@ -6,24 +6,10 @@
 #include <tuple>
 
 #include "tests/support/parameter_values.h"
+#include "tests/support/shifting_warper.h"
 
 namespace kelp::effect {
 namespace {
-
-// One frame that stays where it is.
-boost::shared_ptr<const marrow::stabilization::CPWarper> StandingWarper(std::int32_t width,
-                                                                        std::int32_t height) {
-  const auto warper = boost::make_shared<marrow::stabilization::CPWarper>(1, width, height);
-  const auto record =
-      boost::make_shared<marrow::stabilization::VarVector>(warper->gridCols(), warper->gridRows());
-  for (std::size_t i = 0; i < record->values.size(); i += 2) {
-    const auto vertex = static_cast<std::int32_t>(i / 2);
-    record->values[i] = vertex % record->cols * (width - 1.0) / (record->cols - 1);
-    record->values[i + 1] = vertex / record->cols * (height - 1.0) / (record->rows - 1);
-  }
-  warper->storeFrameWarp(record, true);
-  return warper;
-}
 
 boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height) {
   const auto crop = boost::make_shared<cropper>(1, 1920, 1080);
@@ -37,7 +23,7 @@ struct ZoomCase {
   ZoomCase(std::int32_t width, std::int32_t height, Framing framing) {
     values[kFramingIndex] = static_cast<int>(framing);
     analysis::Replace(state.solve_result, [&](SolveResult& next) {
-      next.warper = StandingWarper(1920, 1080);
+      next.warper = ShiftingWarper(1920, 1080, {{0, 0}});
       next.crop = Window(width, height);
     });
   }
@@ -98,8 +84,8 @@ void Fill(StabilizerState& state, std::int32_t first_frame) {
     next.all_features.first_frame = first_frame;
     next.all_features.features->resize(1);
   });
-  state.solve_result =
-      boost::make_shared<SolveResult>(SolveResult{StandingWarper(64, 36), Window(9, 9), 77, 78});
+  state.solve_result = boost::make_shared<SolveResult>(
+      SolveResult{ShiftingWarper(64, 36, {{0, 0}}), Window(9, 9), 77, 78});
   state.phase = SolvePhase::Solved;
   analysis::AnalyzerRecord job;
   job.tracker_guid = Guid::MakeUnique();
