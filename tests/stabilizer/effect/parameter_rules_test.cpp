@@ -49,25 +49,25 @@ TEST(ParameterRulesTest, SpacingKeepsFiveTimesTheSlotsApart) {
     EXPECT_EQ(GetSelectorParams(ParameterValues(), c.width, c.height).spacing, c.normal) << c.width;
     EXPECT_EQ(GetSelectorParams(Detailed(), c.width, c.height).spacing, c.detailed) << c.width;
   }
-}
-
-TEST(ParameterRulesTest, WindowsGrowWithTheHeight) {
-  const struct {
-    std::uint32_t height;
-    std::uint64_t half;
-  } cases[] = {{300, 7}, {480, 7},  {554, 7},   {555, 8},   {576, 8},  {600, 8},
-               {630, 9}, {720, 10}, {1079, 14}, {1080, 15}, {2000, 15}};
-  for (const auto& c : cases) {
-    EXPECT_EQ(WindowRule(c.height, false), c.half) << c.height;
-    EXPECT_EQ(WindowRule(c.height, true), c.half + 5) << c.height;
-  }
-}
-
-TEST(ParameterRulesTest, DetailedAnalysisTakesMoreFeaturesAndToleratesMore) {
   EXPECT_EQ(GetSelectorParams(ParameterValues(), 1920, 1080).max_count, 500u);
   EXPECT_EQ(GetSelectorParams(Detailed(), 1920, 1080).max_count, 2000u);
   EXPECT_EQ(GetTrackerParams(ParameterValues(), 1080).tolerance_min_correlation, 0.7);
   EXPECT_EQ(GetTrackerParams(Detailed(), 1080).tolerance_min_correlation, 0.5);
+}
+
+TEST(ParameterRulesTest, WindowsGrowWithTheHeight) {
+  for (const auto& [height, half] : {std::pair{300u, 7u},
+                                     {554, 7},
+                                     {555, 8},
+                                     {600, 8},
+                                     {630, 9},
+                                     {720, 10},
+                                     {1079, 14},
+                                     {1080, 15},
+                                     {2000, 15}}) {
+    EXPECT_EQ(WindowRule(height, false), half) << height;
+    EXPECT_EQ(WindowRule(height, true), half + 5) << height;
+  }
 }
 
 // Rate 25: sigmas of the crop path over the range of its control.

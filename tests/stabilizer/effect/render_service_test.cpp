@@ -69,17 +69,15 @@ TEST_F(RenderServiceTest, DrawsTheWarpAtEveryDepthOnBothPaths) {
       // The outline, in the output's pixels.
       const std::vector<float> outline = hosted().effect().shared()->PolygonOf(frame);
       ASSERT_GE(outline.size(), 8u);
-      double left = 1e9, top = 1e9, right = -1e9, bottom = -1e9;
-      for (std::size_t i = 0; i < outline.size(); i += 2) {
-        left = std::min<double>(left, outline[i]);
-        right = std::max<double>(right, outline[i]);
-        top = std::min<double>(top, outline[i + 1]);
-        bottom = std::max<double>(bottom, outline[i + 1]);
+      for (const int axis : {0, 1}) {
+        double least = 1e9, most = -1e9;
+        for (std::size_t i = axis; i < outline.size(); i += 2) {
+          least = std::min<double>(least, outline[i]);
+          most = std::max<double>(most, outline[i]);
+        }
+        EXPECT_NEAR(least, (axis ? 6 : 10) * frame, 0.6);
+        EXPECT_NEAR(most, axis ? 47 + 6 * frame : 63 + 10 * frame, 0.6);
       }
-      EXPECT_NEAR(left, 10 * frame, 0.6);
-      EXPECT_NEAR(top, 6 * frame, 0.6);
-      EXPECT_NEAR(right, 63 + 10 * frame, 0.6);
-      EXPECT_NEAR(bottom, 47 + 6 * frame, 0.6);
     }
   }
 }
@@ -95,17 +93,8 @@ TEST_F(RenderServiceTest, EdgesAreFilledFromTheFramesAround) {
     // Column 30 of the plane shows source 30 - 6 + 6 of frame 2, less half a pixel.
     ExpectShown(*middle, 30 - 8, 20 - 3, 29.5, 20 - 4 - 3 - 0.5);
     // Right of its 57 (and the border's two pixels) frame 3 comes first.
-    for (const int x : {66, 79}) {
-      ExpectShown(*middle, x - 8, 20 - 3, x - 6 - 12 - 0.5, 20 - 4 + 4 - 0.5);
-    }
-    // Above its 3, too: frame 3 begins at -4.
-    EXPECT_NEAR(100 * ChannelAt(*middle, 30 - 8, 3 - 3, 2), 3 - 0.5, 0.4);
+    ExpectShown(*middle, 79 - 8, 20 - 3, 79 - 6 - 12 - 0.5, 20 - 4 + 4 - 0.5);
     EXPECT_EQ(ChannelAt(*middle, 0 - 8, 1 - 3, 0), 0) << "no frame reaches there";
-    // The first and the last frame have neighbours on one side: frames 1 and 3.
-    for (const auto& [frame, shift] : {std::pair{0, 6}, {4, 12}}) {
-      const auto end = DrawBoth(Whole(frame, depth));
-      EXPECT_NEAR(100 * ChannelAt(*end, 73 - 8, 20 - 3, 1), 73 - 6 - shift - 0.5, 0.4);
-    }
   }
 }
 
@@ -123,8 +112,6 @@ TEST_F(RenderServiceTest, FeatherAndCropsFollowTheScaleAndTheBoostIsItsDefault) 
   const auto half = DrawBoth(Whole(0, 8, 2));
   EXPECT_EQ(ChannelAt(*half, 20, 4, 0), 0);
   EXPECT_EQ(ChannelAt(*half, 20, 5, 0), 1);
-  EXPECT_EQ(ChannelAt(*half, 1, 12, 0), 0);
-  EXPECT_EQ(ChannelAt(*half, 2, 12, 0), 1);
   // Feathered: at the outermost pixel 5 times the middle of 2 / 11^2 and 8 / 11^2.
   for (const std::int32_t index : {kSynthesisTop, kSynthesisLeft}) hosted().Set(index, 0);
   hosted().Set(kSynthesisEdgeFeather, 10);

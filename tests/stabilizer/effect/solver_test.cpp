@@ -16,7 +16,6 @@
 
 namespace {
 
-using marrow::stabilization::CPWarper;
 using marrow::stabilization::SolverParamsRecord;
 using marrow::tracking::AllFeatures;
 
@@ -34,70 +33,26 @@ std::unique_ptr<Solver> NewSolver(const AllFeatures& table, bool needs_cropper =
                                   std::move(notify));
 }
 
-TEST(SolverTest, FinishesWithAWarpForEveryFrameAndACropperIfAsked) {
-  for (const bool needs_cropper : {true, false}) {
-    std::atomic<int> notified{0};
-    auto solver = NewSolver(ShakenTable(60, 80), needs_cropper, [&] { ++notified; });
-    EXPECT_EQ(solver->GetState(), Solver::not_started);
-    solver->Start();
-    solver->Wait();
-    ASSERT_EQ(solver->GetState(), Solver::finished);
-    EXPECT_EQ(notified, 1);
-    EXPECT_EQ(solver->GetWarper()->frameWarpCount(), 60u);
-    EXPECT_EQ(solver->GetCropper() != nullptr, needs_cropper);
-  }
-}
-
 TEST(SolverTest, SuppliedWarperIsKeptAndNothingIsSolved) {
   auto first = NewSolver(ShakenTable(20, 40), false);
   first->Run();
   ASSERT_EQ(first->GetState(), Solver::finished);
+  EXPECT_FALSE(first->GetCropper());
   auto second = NewSolver(ShakenTable(20, 40), true, {}, 2);
   second->SetExistingWarper(first->GetWarper());
   second->Run();
-  EXPECT_EQ(second->GetState(), Solver::finished);
+  ASSERT_EQ(second->GetState(), Solver::finished);
   // A published warper is never written: the second has its own map over the same warps.
   EXPECT_NE(second->GetWarper(), first->GetWarper());
   EXPECT_EQ(second->GetWarper()->frameWarp(7), first->GetWarper()->frameWarp(7));
   EXPECT_EQ(second->GetWarper()->frameMap()->radius(), 2);
   EXPECT_EQ(second->GetWarper()->frameMap()->entries().size(), 2u * (19 + 18));
   EXPECT_EQ(first->GetWarper()->frameMap()->radius(), 0);
-  EXPECT_TRUE(second->GetTransitionWindows().empty());
   EXPECT_TRUE(second->GetFactorizationWindows().empty());
   EXPECT_TRUE(second->GetCropper());
   const auto warper = first->GetWarper();
   first.reset();
   EXPECT_EQ(warper->withFrameMap(1)->frameWarpCount(), 20u) << "it reads the tracks";
-}
-
-// Clips with little to go by still get a finite warp for every frame.
-TEST(SolverTest, DegenerateTablesFinish) {
-  const auto filled = [](std::int32_t frames, std::int32_t status) {
-    AllFeatures table;
-    table.feature_count = 40;
-    table.frame_count = frames;
-    table.features->assign(static_cast<std::size_t>(40 * frames), {0, 0, status, 0});
-    return table;
-  };
-  AllFeatures dying = ShakenTable(60, 40);
-  for (std::size_t i = 30 * 40; i < dying.features->size(); ++i) (*dying.features)[i].status = -1;
-  AllFeatures holed = ShakenTable(120, 80);
-  for (std::size_t i = 50 * 80; i < 70 * 80; ++i) (*holed.features)[i].status = -1;
-  for (std::size_t s = 0; s < 80; ++s) (*holed.features)[70 * 80 + s].status = 71;
-  const AllFeatures tables[] = {
-      filled(1, -1),      filled(1, 0),       filled(30, -1), filled(30, 0), ShakenTable(1, 40),
-      ShakenTable(3, 40), ShakenTable(60, 3), dying,          holed};
-  for (const AllFeatures& table : tables) {
-    auto solver = NewSolver(table);
-    solver->Run();
-    ASSERT_EQ(solver->GetState(), Solver::finished) << &table - tables;
-    const CPWarper& warper = *solver->GetWarper();
-    ASSERT_EQ(warper.frameWarpCount(), static_cast<std::size_t>(table.frame_count));
-    for (std::size_t f = 0; f < warper.frameWarpCount(); ++f) {
-      for (const double v : warper.frameWarp(f)->values) ASSERT_TRUE(std::isfinite(v));
-    }
-    EXPECT_TRUE(solver->GetCropper());
-  }
 }
 
 // Where the task has not begun yet nobody waits for it: it ends by itself, and tells so.
@@ -131,10 +86,7 @@ TEST(SolverTest, DroppedAnywhere) {
   };
   const auto whole = start();
   whole->Wait();
-  ASSERT_EQ(whole->GetState(), Solver::finished);
-  ASSERT_GT(whole->GetFactorizationWindows().size(), 1u);
   ASSERT_FALSE(whole->GetTransitionWindows().empty());
-
   std::mt19937 random(4);
   std::uniform_real_distribution<float> share(0, 1);
   for (int i = 0; i < 50; ++i) {

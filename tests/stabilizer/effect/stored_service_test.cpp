@@ -74,52 +74,36 @@ TEST_F(StoredServiceTest, ASolvedEffectComesBackBitForBitAndHasNothingToDo) {
   }
 }
 
-TEST_F(StoredServiceTest, TheHeaderOfWhatIsSaved) {
-  Solve(3);
-  const std::string bytes = BytesOf(hosted.Save());
-  std::uint64_t words[3];
-  std::memcpy(words, bytes.data(), sizeof words);
-  EXPECT_EQ(words[0], 16 + (std::uint64_t{1} << 32) + (std::uint64_t{1} << 40));  // flattened, raw
-  EXPECT_EQ(words[1], 0u) << "no address";
-  EXPECT_EQ(words[2], bytes.size() - 31);
-}
-
-TEST_F(StoredServiceTest, AFramingAloneIsMadeFromTheStoredWarps) {
-  Solve(1);
-  hosted.Reopen();
-  const std::vector<double> warp = hosted.Warp(3);
-  hosted.HoldSolve("Begin - RunCropper()");
-  hosted.Set(kFraming, 2);
-  hosted.TickUntilHeld();
-  // Saved in the middle of it, it begins anew and keeps what it had.
-  const SavedEffect middle = SaveInTheMiddle();
-  hosted.stages().Take();
-  hosted.Open(middle);
-  EXPECT_EQ(hosted.Warp(3), warp);
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(hosted.stages().Take(), "crop ");
-}
-
+// And keeps what it had until the new results are there. A framing alone needs no more than the
+// stored warps.
 TEST_F(StoredServiceTest, SavedInTheMiddleOfASolveItSolves) {
   hosted.Apply();
+  hosted.Set(kFraming, 1);
   hosted.HoldSolve();
   hosted.TickUntilHeld();
   hosted.Open(SaveInTheMiddle());
   EXPECT_TRUE(hosted.Warp(3).empty());
-  hosted.stages().Take();
   EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
-  // A later one: what was solved stays until the new results are there.
-  const std::vector<double> warp = hosted.Warp(3);
-  hosted.HoldSolve();
-  hosted.Set(kSmoothness, 10);
-  hosted.TickUntilHeld();
-  hosted.Open(SaveInTheMiddle());
-  hosted.stages().Take();
-  EXPECT_EQ(hosted.Warp(3), warp);
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
-  EXPECT_NE(hosted.Warp(3), warp);
+  const struct {
+    const char* held_at;
+    std::int32_t index;
+    double value;
+    const char* runs;
+  } cases[] = {{"Begin - RunCropper()", kFraming, 2, "crop "},
+               {"Begin - RunFactorization()", kSmoothness, 10, "factorization crop "}};
+  for (const auto& c : cases) {
+    hosted.Reopen();
+    const std::vector<double> warp = hosted.Warp(3);
+    hosted.HoldSolve(c.held_at);
+    hosted.Set(c.index, c.value);
+    hosted.TickUntilHeld();
+    hosted.Open(SaveInTheMiddle());
+    hosted.stages().Take();
+    EXPECT_EQ(hosted.Warp(3), warp);
+    EXPECT_EQ(hosted.Settle(), 8);
+    EXPECT_EQ(hosted.stages().Take(), c.runs);
+    EXPECT_EQ(hosted.Warp(3) == warp, c.index == kFraming);
+  }
 }
 
 TEST(StoredCompressionTest, OptionsAndTheHostDecideWhetherItIsDeflated) {
@@ -145,6 +129,11 @@ TEST_F(StoredServiceTest, WhatCannotBeReadIsToldAndWaitsForAnalyze) {
   Solve(2);
   const SavedEffect saved = hosted.Save();
   const std::string good = BytesOf(saved);
+  std::uint64_t words[3];
+  std::memcpy(words, good.data(), sizeof words);
+  EXPECT_EQ(words[0], 16 + (std::uint64_t{1} << 32) + (std::uint64_t{1} << 40));  // flattened, raw
+  EXPECT_EQ(words[1], 0u) << "no address";
+  EXPECT_EQ(words[2], good.size() - 31);
   const std::size_t mesh = good.find("hseM");
   std::string bad_marker = good, other_grid = good, deflated_12 = good;
   bad_marker[mesh] = 'H';

@@ -131,31 +131,30 @@ TYPED_TEST(Stripes, TheNearestFrameThatCoversAPixelShowsAndTheNextOneBeforeTheLa
   //     frame  0   1   2  3   4    5
   this->Shoot({60, 30, 0, 30, 60, -30});
   ASSERT_EQ(this->Row(2).size(), 113u);  // 23 + 60 + 30, from -30 on
+  const Asked all{2, 3, 1, 4, 0, 5};
   const struct {
-    std::size_t x;
-    int shown;
-  } cases[] = {{10, 5}, {27, -1}, {40, 2}, {70, 3}, {100, 4}};  // 3, not 1; 4, not 0
-  for (const auto& c : cases) EXPECT_EQ(this->Shown(2, c.x), c.shown) << c.x;
-  EXPECT_EQ(this->pictures.asked, (Asked{2, 3, 1, 4, 0, 5}));
-
-  this->clip.without_motion = {3};
-  EXPECT_EQ(this->Shown(2, 70), 1);
-  this->clip.without_motion = {1, 3};
-  EXPECT_EQ(this->Shown(2, 70), -1);
-  this->clip.without_motion.clear();
-
-  this->settings.synthesis_range = 1;
-  EXPECT_EQ(this->Shown(2, 100), -1);
-  EXPECT_EQ(this->pictures.asked, (Asked{2, 3, 1}));
-  this->settings.synthesis_range = 0;
-  EXPECT_EQ(this->Shown(2, 70), -1);
-
-  // At the clip's ends only one side is there.
-  this->settings.synthesis_range = 2;
-  EXPECT_EQ(this->Shown(0, 70), 1);
-  EXPECT_EQ(this->pictures.asked, (Asked{0, 1, 2}));
-  EXPECT_EQ(this->Shown(5, 70), 3);
-  EXPECT_EQ(this->pictures.asked, (Asked{5, 4, 3}));
+    std::size_t frame, x;
+    int range, shown;
+    Asked asked;
+    std::set<std::size_t> without_motion = {};
+  } cases[] = {{2, 10, 10, 5, all},
+               {2, 27, 10, -1, all},
+               {2, 40, 10, 2, all},
+               {2, 70, 10, 3, all},   // not 1
+               {2, 100, 10, 4, all},  // not 0
+               {2, 70, 10, 1, {2, 1, 4, 0, 5}, {3}},
+               {2, 70, 10, -1, {2, 4, 0, 5}, {1, 3}},
+               {2, 100, 1, -1, {2, 3, 1}},
+               {2, 70, 0, -1, {2}},
+               // At the clip's ends only one side is there.
+               {0, 70, 2, 1, {0, 1, 2}},
+               {5, 70, 2, 3, {5, 4, 3}}};
+  for (const auto& c : cases) {
+    this->settings.synthesis_range = c.range;
+    this->clip.without_motion = c.without_motion;
+    EXPECT_EQ(this->Shown(c.frame, c.x), c.shown) << c.frame << ", " << c.x;
+    EXPECT_EQ(this->pictures.asked, c.asked) << c.frame << ", " << c.x;
+  }
 }
 
 TYPED_TEST(Stripes, FeatherAndBoostAreInTheAlphas) {

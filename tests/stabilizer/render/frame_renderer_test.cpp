@@ -287,28 +287,6 @@ TYPED_TEST(FrameRenderer, PixelsWorkedOut) {
   EXPECT_NEAR(shown(settings, 22, 12), 4 * 20.5 + 2 * 10.5, near);
 }
 
-// A sample half a pixel to the left of columns of alphas 1, 0, 1/5, 1.
-TYPED_TEST(FrameRenderer, ColoursCountByTheirAlpha) {
-  const SolvedClip clip(16, 16, 3, 3, Moved(0, 0));
-  Pictures<TypeParam> pictures;
-  pictures.Add(16, 16, {});
-  const double alpha[] = {1, 0, 0.2, 1}, green[] = {0.4, 0.8, 0.8, 0.2};
-  for (int i = 0; i < 256; ++i) {
-    const int column = i % 16 / 4;
-    pictures.worlds[0]->data()[i] = PixelOf<TypeParam>(alpha[column], 0, green[column], 0);
-  }
-  const WorldX<TypeParam> out = Rendered(clip, pictures, {.framing = Framing::stabilize_only});
-  const struct {
-    int x;
-    double alpha, green;
-  } expected[] = {{3, 1, 0.4},   {4, 0.5, 0.4},  {6, 0, 0},
-                  {8, 0.1, 0.8}, {10, 0.2, 0.8}, {12, 0.6, 0.3}};  // (0.2 * 0.8 + 1 * 0.2) / 1.2
-  for (const auto& e : expected) {
-    EXPECT_NEAR(out.row(8)[e.x].alpha / full<TypeParam>, e.alpha, 0.6 / 255) << e.x;
-    EXPECT_NEAR(out.row(8)[e.x].green / full<TypeParam>, e.green, 0.6 / 255) << e.x;
-  }
-}
-
 // Each kernel that this processor runs, to the bit: rows of many vectors and rests of all lengths,
 // opaque stretches and edges of alpha. Strips on one thread and on many, over cells that overlap.
 TYPED_TEST(FrameRenderer, NeitherInstructionSetNorThreadsShow) {

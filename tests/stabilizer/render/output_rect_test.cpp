@@ -35,8 +35,8 @@ TEST(SetupOutputRect, TheWholePlaneWithoutACrop) {
   });
   const Renderer renderer = makeRenderer(clip, 1, 1);
   const auto numbers = [&](Framing framing) {
-    const OutputRect rect = setupOutputRect(framing, renderer, 100, 80);
-    return std::vector<int>{rect.width, rect.height, rect.origin_x, rect.origin_y};
+    const auto [width, height, x, y] = setupOutputRect(framing, renderer, 100, 80);
+    return std::vector<int>{width, height, x, y};
   };
   // 99 * 1.1 = 108.9 and 79 * 1.1 = 86.9; half of the difference, truncated.
   EXPECT_THAT(numbers(Framing::stabilize_only), ElementsAre(109, 87, 4, 3));

@@ -53,12 +53,6 @@ inline Sample ReadSample(const std::string& name) {
   return sample;
 }
 
-// Of a version before 7 there is one, whatever has become of the solve: nothing tells it.
-inline Sample ReadSample(std::uint32_t version, const std::string& solve) {
-  const std::string name = (version < 10 ? "v0" : "v") + std::to_string(version);
-  return ReadSample(name + '_' + (version < 7 ? "solved" : solve));
-}
-
 // A number as it lies in a payload.
 template <class Number>
 std::string BytesOf(Number number) {

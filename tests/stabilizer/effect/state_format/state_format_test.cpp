@@ -117,8 +117,8 @@ TEST(StateFormatTest, EachVersionTellsWhatItKnows) {
 }
 
 TEST(StateFormatTest, RawIsAnswerableForFromVersion13) {
-  for (std::uint32_t version = 10; version <= 16; ++version) {
-    const auto& [same, deflated, plain] = ReadSample(version, "solved");
+  for (const char* const name : {"v12_solved", "v13_solved", "v16_solved"}) {
+    const auto& [version, deflated, plain] = ReadSample(name);
     if (version < 13) {
       EXPECT_EQ(Read(deflated, version, true).result->all_features.frame_count, 2);
       EXPECT_EQ(ReasonOf(plain, version, true), StateRefused::Reason::Damaged);
@@ -189,8 +189,6 @@ TEST(StateFormatTest, WarpsKeepTheirBits) {
   for (int f = 0; f < 2; ++f) {
     EXPECT_TRUE(back->frameWarp(f)->values == warper->frameWarp(f)->values);
   }
-  EXPECT_EQ(back->unionBounds().min_x, warper->unionBounds().min_x);
-  EXPECT_EQ(back->unionBounds().max_y, warper->unionBounds().max_y);
 }
 
 // The solved sample, with what `change` makes of its job's text.
@@ -215,9 +213,8 @@ std::string WithJob(const Change& change) {
 // Later keys may be missing; a wrapped one is one as well; others are damage.
 TEST(StateFormatTest, TextsThatAreAJob) {
   const auto later_keys_missing = WithJob([](std::string& job) {
-    for (const char* const key :
-         {",\"eig_ratio_threshold\"", ",\"tolerance_primary_color_threshold\"", ",\"job_stage\""}) {
-      const std::size_t begin = job.find(key);
+    for (const char* const key : {"eig_ratio_thr", "tolerance_primary_color", "job_stage"}) {
+      const std::size_t begin = job.find(key) - 2;
       job.erase(begin, job.find('}', begin) - begin);
     }
   });
@@ -248,34 +245,6 @@ TEST(StateFormatTest, TextsThatAreAJob) {
     };
     EXPECT_EQ(ReasonOf(WithJob(change), 16, true), StateRefused::Reason::Damaged) << to;
   }
-}
-
-// The example of docs/state_format.md, as a reader of the page has it before them.
-TEST(StateFormatTest, TheExampleOfThePageIsOne) {
-  std::ifstream page(CALMFRAME_DOCS "/state_format.md");
-  ASSERT_TRUE(page);
-  // Offset, two spaces, at most 16 bytes in 47 columns.
-  constexpr char kHex[] = "0123456789abcdef";
-  std::string bytes;
-  for (std::string line; std::getline(page, line);) {
-    if (line.size() < 8 || line.find_first_not_of(kHex) != 4 || line.substr(4, 2) != "  ") continue;
-    std::istringstream words(line.substr(6, 47));
-    for (std::string word; words >> word;) {
-      bytes += static_cast<char>(std::stoi(word, nullptr, 16));
-    }
-  }
-  ASSERT_GT(bytes.size(), 24u);
-  EXPECT_EQ(bytes.substr(0, 6), std::string("\x10\0\0\0\1\1", 6));
-  std::uint64_t length = 0;
-  std::memcpy(&length, bytes.data() + 16, 8);
-  ASSERT_EQ(bytes.size(), 24 + length);
-  const std::string payload = bytes.substr(24);
-  const SavedState state = Read(payload, 16, true, {640, 360, 1, 1});
-  EXPECT_EQ(state.result->all_features.frame_count, 1);
-  EXPECT_EQ(state.result->all_features.features->at(1).x, 20.5f);
-  EXPECT_EQ(state.phase, SolvePhase::Failed);
-  EXPECT_EQ(state.result->job_input.StepTime.denominator, 25);
-  EXPECT_TRUE(Written(state) == payload);
 }
 
 }  // namespace
