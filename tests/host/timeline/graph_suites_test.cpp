@@ -102,9 +102,6 @@ TEST_F(GraphSuitesTest, ALayerStandsFromItsInPointForItsLength) {
   EXPECT_TRUE(stands(-2 * kFrame));
   EXPECT_TRUE(stands(3 * kFrame - 1));
   EXPECT_FALSE(stands(3 * kFrame));
-  services.faults.node_missing = true;
-  EXPECT_FALSE(stands(0));
-  services.faults.node_missing = false;
   layer->Change([](LayerState& state) { state.length = 0; });
   EXPECT_FALSE(stands(-2 * kFrame));
   std::int64_t ticks = 0;

@@ -268,18 +268,12 @@ TEST_F(RenderSuitesTest, WhatCannotBeRenderedIsRefusedOrNull) {
   EXPECT_NE(Ask(node + 100, 0, delivery), HX_ERR_NONE);
   EXPECT_NE(renders.RenderAsync(node, 0, kFrame, nullptr, Delivery::Callback, &delivery, nullptr),
             HX_ERR_NONE);
-  services.faults.render_refused = services.faults.identifier_failed = true;
-  const HX_RenderParams params = Params();
+  services.faults.render_refused = true;
   EXPECT_NE(Ask(node, 0, delivery), HX_ERR_NONE);
-  EXPECT_NE(renders.MakeIdentifier(node, 0, kFrame, 6, 4, 1, 1, &params, &text), HX_ERR_NONE);
-  services.faults.render_refused = services.faults.identifier_failed = false;
+  services.faults.render_refused = false;
   EXPECT_EQ(delivery.calls, 0);
   EXPECT_EQ(delivery.id, 77);
 
-  services.faults.null_frame = true;
-  EXPECT_EQ(Render(node, 0), 0);
-  EXPECT_FALSE(Cached(GuidAt(node, 0)));
-  services.faults.null_frame = false;
   services.faults.early_callback = true;
   EXPECT_EQ(Ask(node, 0, delivery), HX_ERR_NONE);
   EXPECT_EQ(delivery.calls, 1) << "before the call returned";
