@@ -172,9 +172,12 @@ TEST_F(ClipReaderTest, AFrameInTwoPacketsIsOneFrame) {
   EXPECT_EQ(van->info().frame_count, 36u);
   EXPECT_EQ(van->info().field_order, FieldOrder::top_first);
   EXPECT_EQ(van->info().frame_rate.num, 25 * van->info().frame_rate.den);
-  const Frame last = Read(*van, 35);
-  EXPECT_FALSE(SamePixels(Read(*van, 34), last));
-  EXPECT_TRUE(SamePixels(Read(*van, 35), last));
+  const Frame last = Read(*van, 35), middle = Read(*van, 17);
+  for (const std::size_t i : {0, 16, 17, 18, 34, 35}) {
+    const Frame frame = Read(*van, i);
+    EXPECT_EQ(SamePixels(frame, middle), i == 17);
+    EXPECT_EQ(SamePixels(frame, last), i == 35);
+  }
 }
 
 }  // namespace
