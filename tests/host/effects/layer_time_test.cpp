@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/host/effects/drawn_clip.h"
+#include "host/timeline/layer.h"
 
 namespace calmframe::host {
 namespace {

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <boost/make_shared.hpp>
+#include <cstdint>
 #include <functional>
 #include <map>
 #include <memory>
@@ -9,25 +11,35 @@
 
 #include "host/base/operations.h"
 #include "host/effects/session.h"
-#include "tests/host/effects/drawn_clip.h"
-#include "tests/host/effects/probe.h"
+#include "platform/hx/hx.h"
+#include "tests/host/timeline/drawn_media.h"
 
 namespace calmframe::host {
 
-// A host of the probe, which does at each command what the test wants; what it leaves behind or
-// does wrong fails the test.
+inline constexpr int kClipWidth = 23, kClipHeight = 20, kClipFrames = 10;
+
+inline boost::shared_ptr<Layer> MakeDrawnLayer() {
+  const SourceInfo info = DrawnInfo(kClipWidth, kClipHeight, kClipFrames);
+  return boost::make_shared<Layer>(MakeDrawnSource(info, DrawFrame));
+}
+
+// A host of a plug-in that does at each command what the test wants; what it leaves behind or does
+// wrong fails the test. One at a time.
 class ProbeTest : public testing::Test {
  protected:
-  using Call = probe::Call;
+  struct Call {
+    std::uint32_t command;
+    HX_InData* in;
+    HX_OutData* out;
+    HX_ParamDef** params;
+    HX_World* output;
+    void* extra;
+    const HX_Callbacks& cb() const { return *in->cb; }
+  };
   using Deed = std::function<HX_Err(const Call&)>;
 
-  ProbeTest() {
-    probe::Behaviour() = [this](const Call& call) {
-      const auto deed = on.find(call.command);
-      return deed == on.end() ? HX_ERR_NONE : deed->second(call);
-    };
-  }
-  ~ProbeTest() override { probe::Behaviour() = nullptr; }
+  ProbeTest() { current_ = this; }
+  ~ProbeTest() override { current_ = nullptr; }
   void TearDown() override {
     Operations::Get().FailNone();
     if (host) {
@@ -35,9 +47,22 @@ class ProbeTest : public testing::Test {
     }
   }
 
+  static PluginLibrary Probe() {
+    PluginProperties record;
+    record.match_name = "Probe";
+    return PluginLibrary(
+        [](std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef* params[],
+           HX_World* output, void* extra) -> HX_Err {
+          const auto deed = current_->on.find(command);
+          if (deed == current_->on.end()) return HX_ERR_NONE;
+          return deed->second({command, in, out, params, output, extra});
+        },
+        record);
+  }
+
   // Starts the plug-in.
-  void Start(const HostSettings& settings = {}) {
-    host = std::make_unique<Host>(PROBE_PLUGIN, settings);
+  void Start() {
+    host = std::make_unique<Host>(Probe());
     host->worlds().SetRowPadding(8);
     host->handles().MoveOnUnlock(true);
     session = std::make_unique<Session>(*host);
@@ -51,31 +76,25 @@ class ProbeTest : public testing::Test {
     return report;
   }
 
+  template <class Table>
+  static const Table& Acquired(const Call& call, const char* name, std::int32_t version) {
+    const void* table = nullptr;
+    EXPECT_EQ(call.in->basic->acquire(name, version, &table), HX_ERR_NONE) << name;
+    return *static_cast<const Table*>(table);
+  }
+  // Runs `work` with a suite.
+  template <class Table, class Work>
+  static void With(const Call& call, const char* name, std::int32_t version, const Work& work) {
+    work(Acquired<Table>(call, name, version));
+    call.in->basic->release(name, version);
+  }
+
   std::map<std::uint32_t, Deed> on;  // by command; none: it does nothing
   std::unique_ptr<Host> host;
   std::unique_ptr<Session> session;
-};
-
-// A suite, for as long as this stands.
-template <class Table>
-class Suite {
- public:
-  Suite(const probe::Call& call, const char* name, std::int32_t version)
-      : basic_(*call.in->basic), name_(name), version_(version) {
-    const void* table = nullptr;
-    EXPECT_EQ(basic_.acquire(name, version, &table), HX_ERR_NONE) << name;
-    table_ = static_cast<const Table*>(table);
-  }
-  ~Suite() { basic_.release(name_, version_); }
-  Suite(const Suite&) = delete;
-  Suite& operator=(const Suite&) = delete;
-  const Table* operator->() const { return table_; }
 
  private:
-  const HX_BasicSuite& basic_;
-  const char* const name_;
-  const std::int32_t version_;
-  const Table* table_;
+  static inline ProbeTest* current_ = nullptr;
 };
 
 }  // namespace calmframe::host

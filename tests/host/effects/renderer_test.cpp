@@ -1,5 +1,6 @@
 #include "host/effects/renderer.h"
 
+#include <array>
 #include <cmath>
 #include <vector>
 
@@ -11,6 +12,10 @@ namespace {
 
 using Rgb = std::vector<int>;
 const Rgb kClear = {-1, -1, -1};
+
+std::array<int, 4> Sides(const HX_Rect& rect) {
+  return {rect.left, rect.top, rect.right, rect.bottom};
+}
 
 // In 255ths.
 Rgb At(const WorldBuffer& buffer, int x, int y) {
@@ -108,62 +113,59 @@ class RendererTest : public ProbeTest {
   std::unique_ptr<Renderer> renderer;
 };
 
-TEST_F(RendererTest, BothPathsDrawTheFrameAtEachDepth) {
+TEST_F(RendererTest, BothPathsDrawWhatIsAskedForAtItsPlace) {
   ASSERT_TRUE(renderer->result().ok());
-  for (const bool direct : {true, false}) {
-    for (const int depth : {8, 16, 32}) {
-      const RenderedFrame frame = Render(direct, {3, depth});
-      if (direct && depth == 32) {
+  const HX_Rect whole = {0, 0, kClipWidth, kClipHeight}, grown = {-4, -4, 27, 24};
+  const RenderRequest part{4, 8, {1, 1}, HX_Rect{10, -3, 14, 2}};
+  const struct {
+    RenderRequest request;
+    int margin, offset;
+    HX_Rect lies;
+    int x, y;  // in layer coordinates
+    Rgb shown;
+  } cases[] = {
+      {{3}, 0, 0, whole, 22, 19, {212, 3, 7}},     {{3, 16}, 0, 0, whole, 22, 19, {212, 3, 7}},
+      {{3, 32}, 0, 0, whole, 22, 19, {212, 3, 7}}, {{5}, 0, -1, whole, 7, 8, {87, 4, 7}},
+      {{5}, 0, 1, whole, 7, 8, {87, 6, 7}},        {{2}, 4, 0, grown, 5, 6, {65, 2, 7}},
+      {{2, 16}, 4, 0, grown, -4, -4, kClear},      {part, 0, 0, {10, 0, 14, 2}, 13, 1, {23, 4, 7}}};
+  for (const auto& c : cases) {
+    margin = c.margin;
+    offset = c.offset;
+    for (const bool direct : {true, false}) {
+      SCOPED_TRACE(testing::Message() << &c - cases << direct);
+      const RenderedFrame frame = Render(direct, c.request);
+      if (direct && c.request.bit_depth == 32) {
         EXPECT_FALSE(frame.result.ok());
         continue;
       }
-      ASSERT_TRUE(frame.pixels) << direct << depth;
-      EXPECT_EQ(At(*frame.pixels, 32, 19), (Rgb{60, 32, 19}));
-      EXPECT_EQ(frame.pixels->world().format, FormatOfDepth(depth));
-      // The frames beside it, and none past either end.
-      for (const int beside : {-1, 1}) {
-        offset = beside;
-        EXPECT_EQ(At(*Render(direct, {5, depth}).pixels, 7, 8), (Rgb{100 + 20 * beside, 7, 8}));
-        EXPECT_EQ(Render(direct, {beside < 0 ? 0 : kClipFrames - 1}).result.code, HX_ERR_UNKNOWN);
+      ASSERT_TRUE(frame.pixels);
+      EXPECT_EQ(frame.pixels->world().format, FormatOfDepth(c.request.bit_depth));
+      EXPECT_EQ(Sides(frame.pixels->rect()), Sides(c.lies));
+      EXPECT_EQ(Sides(frame.full_rect), Sides(c.margin > 0 ? grown : whole));
+      EXPECT_EQ(At(*frame.pixels, c.x - c.lies.left, c.y - c.lies.top), c.shown);
+      EXPECT_EQ(frame.OnLayer()->world().width, kClipWidth);
+      if (c.x >= 0) {
+        EXPECT_EQ(At(*frame.OnLayer(), c.x, c.y), c.shown);
       }
-      offset = 0;
     }
+  }
+}
+
+TEST_F(RendererTest, WhereThereIsNothingNothingComes) {
+  for (const bool direct : {true, false}) {
     EXPECT_FALSE(Render(direct, {0, 24}).result.ok());
     EXPECT_FALSE(Render(direct, {0, 8, {2, 1}}).result.ok());
-  }
-}
-
-TEST_F(RendererTest, AGrownOutputLiesAroundTheLayer) {
-  margin = 4;
-  for (const bool direct : {true, false}) {
-    const RenderedFrame grown = Render(direct, {2});
-    ASSERT_TRUE(grown.pixels);
-    EXPECT_EQ(grown.full_rect.left, -4);
-    EXPECT_EQ(grown.full_rect.bottom, kClipHeight + 4);
-    EXPECT_EQ(grown.pixels->world().origin_y, -4);
-    EXPECT_EQ(At(*grown.pixels, 0, 0), kClear);
-    EXPECT_EQ(At(*grown.pixels, 9, 10), (Rgb{40, 5, 6}));
-    const auto frame = grown.OnLayer();
-    EXPECT_EQ(frame->world().width, kClipWidth);
-    EXPECT_EQ(At(*frame, 5, 6), (Rgb{40, 5, 6}));
-  }
-}
-
-TEST_F(RendererTest, APartComesAtItsPlace) {
-  RenderRequest request{4};
-  for (const bool direct : {true, false}) {
-    request.part = HX_Rect{10, -3, 14, 2};
-    const RenderedFrame part = Render(direct, request);
-    ASSERT_TRUE(part.pixels);
-    EXPECT_EQ(part.pixels->world().origin_x, 10);
-    EXPECT_EQ(part.pixels->world().origin_y, 0);
-    EXPECT_EQ(part.pixels->world().width, 4);
-    EXPECT_EQ(part.pixels->world().height, 2);
-    EXPECT_EQ(At(*part.pixels, 3, 1), (Rgb{80, 13, 1}));
-    EXPECT_EQ(part.full_rect.right, kClipWidth);
-    request.part = HX_Rect{50, 0, 60, 10};
-    EXPECT_TRUE(Render(direct, request).result.ok());
-    EXPECT_FALSE(Render(direct, request).pixels);
+    const RenderedFrame beside = Render(direct, {4, 8, {1, 1}, HX_Rect{50, 0, 60, 10}});
+    EXPECT_TRUE(beside.result.ok());
+    EXPECT_FALSE(beside.pixels);
+    const RenderedFrame past = Render(direct, {kClipFrames});
+    EXPECT_TRUE(past.result.ok());
+    EXPECT_EQ(At(*past.OnLayer(), 3, 3), kClear);
+    for (const int past_its_end : {-1, 1}) {
+      offset = past_its_end;
+      EXPECT_EQ(Render(direct, {offset < 0 ? 0 : kClipFrames - 1}).result.code, HX_ERR_UNKNOWN);
+    }
+    offset = 0;
   }
 }
 
@@ -171,36 +173,25 @@ TEST_F(RendererTest, HalfResolutionAveragesAndRoundsUp) {
   for (const bool direct : {true, false}) {
     const RenderedFrame half = Render(direct, {1, 16, {1, 2}});
     ASSERT_TRUE(half.pixels);
-    EXPECT_EQ(half.pixels->world().width, 17);
-    EXPECT_EQ(half.pixels->world().height, 10);
-    // Rows 8 and 9, of a 255th each.
-    EXPECT_NEAR(half.pixels->row<HX_Pixel16>(4)[1].blue, 8.5 / 255 * 32768, 2);
-    EXPECT_EQ(half.layer_width, 17);
-  }
-}
-
-TEST_F(RendererTest, PastItsMediaALayerIsClearAndItBeginsWhereItIsTold) {
-  const RenderedFrame past = renderer->Planned({kClipFrames});
-  EXPECT_TRUE(past.result.ok());
-  EXPECT_FALSE(past.pixels);
-  EXPECT_EQ(At(*past.OnLayer(), 3, 3), kClear);
-  EXPECT_EQ(At(*renderer->Direct({kClipFrames}).pixels, 3, 3), kClear);
-  effect->shared()->layer()->Change([](LayerState& layer) { layer.start_frame = 6; });
-  for (const bool direct : {true, false}) {
-    EXPECT_EQ(At(*Render(direct, {1}).pixels, 0, 1), (Rgb{140, 0, 1}));
+    EXPECT_EQ(Sides(half.pixels->rect()), Sides({0, 0, 12, 10}));
+    // Of two columns and of rows 8 and 9.
+    EXPECT_NEAR(half.pixels->row<HX_Pixel16>(4)[0].red, 85.5 / 255 * 32768, 4);
+    EXPECT_EQ(half.layer_width, 12);
   }
 }
 
 // An interlaced layer's second field stands half a frame later.
-TEST_F(RendererTest, EachFieldIsRenderedAtItsTime) {
-  effect->shared()->layer()->Change(
-      [](LayerState& layer) { layer.field_type = HX_FIELD_FIRST_ORDER; });
+TEST_F(RendererTest, EachFieldIsRenderedAtItsTimeOnALayerThatBeginsElsewhere) {
+  effect->shared()->layer()->Change([](LayerState& layer) {
+    layer.start_frame = 6;
+    layer.field_type = HX_FIELD_FIRST_ORDER;
+  });
   for (const bool direct : {true, false}) {
     for (const bool second : {false, true}) {
-      RenderRequest request{3};
+      RenderRequest request{1};
       request.second_field = second;
       // Lines 0 2 4 ..., or 1 3 5 ... with the nearest of them above.
-      EXPECT_EQ(At(*Render(direct, request).pixels, 5, 0), (Rgb{60, 5, second ? 1 : 0}));
+      EXPECT_EQ(At(*Render(direct, request).pixels, 5, 0), (Rgb{second ? 15 : 5, 7, 7}));
     }
   }
 }
@@ -218,9 +209,10 @@ TEST_F(RendererTest, ParametersStayAsTheyWereWhenTheRenderBegan) {
   on[HX_CMD_RENDER_FRAME] = on[HX_CMD_RENDER_PLANNED_FRAME] = [&](const Call& call) -> HX_Err {
     const HX_InData& in = *call.in;
     HX_ParamDef amount = *call.params[1];
-    Suite<HX_ParamUtilsSuite3> utils(call, HX_PARAM_UTILS_SUITE, 3);
     amount.u.fs.value += 1;
-    EXPECT_EQ(utils->SetParamValue(in.effect_ref, 1, &amount), HX_ERR_NONE);
+    With<HX_ParamUtilsSuite3>(call, HX_PARAM_UTILS_SUITE, 3, [&](const HX_ParamUtilsSuite3& utils) {
+      EXPECT_EQ(utils.SetParamValue(in.effect_ref, 1, &amount), HX_ERR_NONE);
+    });
     call.cb().checkout_param(in.effect_ref, 1, in.current_time, in.time_step, in.time_scale,
                              &amount);
     seen.push_back(amount.u.fs.value);

