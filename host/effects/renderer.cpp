@@ -126,7 +126,10 @@ void Renderer::DrawDirect(const RenderRequest& request, RenderedFrame& rendered)
   const LayerTime time(frames.layer());
   const HX_World* const input = frames.CheckOutInput(
       time.MediaTicks(time.OfFrame(request.frame, request.second_field), time.scale()));
-  const auto check_in = [&frames](const HX_World* held) { frames.CheckInInput(held->data); };
+  // By its pixels: a plug-in that checks in what it never checked out takes the record with it.
+  const auto check_in = [&frames, data = input ? input->data : nullptr](const HX_World*) {
+    frames.CheckInInput(data);
+  };
   const std::unique_ptr<const HX_World, decltype(check_in)> holds(input, check_in);
   // Where the media has no frame the layer is clear.
   std::optional<WorldBuffer> clear;
