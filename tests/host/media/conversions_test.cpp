@@ -94,8 +94,10 @@ Plane ResampledAndTurned(const Plane& from, int size, double first, double step)
     std::vector<std::pair<int, double>> taps;
     double total = 0;
     for (int k = static_cast<int>(at - 2 * stretch) - 1; k <= at + 2 * stretch + 1; ++k) {
+      const double weight = Keys((k - at) / stretch);
+      if (weight == 0) continue;  // a narrow plane has no sample there
       const int inside = k < 0 ? -1 - k : k < from.width ? k : 2 * from.width - 1 - k;
-      taps.emplace_back(inside, Keys((k - at) / stretch));
+      taps.emplace_back(inside, weight);
       total += taps.back().second;
     }
     for (int y = 0; y < from.height; ++y) {
