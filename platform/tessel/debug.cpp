@@ -56,7 +56,7 @@ class Database {
 };
 
 Database& database() {
-  static Database& instance = *new Database;  // detached threads may log while the process ends
+  static Database& instance = *new Database;  // threads may log while the process ends
   return instance;
 }
 

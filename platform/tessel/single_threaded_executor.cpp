@@ -106,7 +106,7 @@ class Pool {
         waiting_.push_back(queue);
         work_.notify_one();
       } else {
-        StartThread(queue);
+        internal::StartThread([this, queue = queue]() mutable { Serve(std::move(queue)); });
       }
     } catch (...) {
       live_.erase(queue);
@@ -130,19 +130,6 @@ class Pool {
 
  private:
   static constexpr int kMaxIdle = 4;
-
-  void StartThread(const boost::shared_ptr<Queue>& queue) {
-    internal::BeginThread();
-    try {
-      std::thread([this, queue = queue]() mutable {
-        Serve(std::move(queue));
-        internal::EndThread();
-      }).detach();
-    } catch (...) {
-      internal::EndThread();
-      throw;
-    }
-  }
 
   void Serve(boost::shared_ptr<Queue> queue) {
     while (queue) {
@@ -170,7 +157,7 @@ class Pool {
 };
 
 Pool& pool() {
-  static Pool& pool = *new Pool;  // outlives detached threads
+  static Pool& pool = *new Pool;  // outlives its threads
   return pool;
 }
 

@@ -5,7 +5,11 @@
 #include <tbb/parallel_for.h>
 
 #include <atomic>
+#include <condition_variable>
+#include <list>
+#include <mutex>
 #include <thread>
+#include <utility>
 
 #include "platform/tessel/shutdown.h"
 #include "platform/tessel/threads_internal.h"
@@ -53,30 +57,59 @@ ProcessorLimit::~ProcessorLimit() = default;
 
 namespace {
 
-// Threads that may run tasks, for Shutdown to wait for.
+// Threads that may run tasks. All are joined in the end: one that was let go could still be on its
+// way out of this library's code when the library is unloaded.
 class LiveThreads {
  public:
-  void Begin() {
+  void Start(boost::function<void()> body) {
+    JoinEnded();
     std::lock_guard<std::mutex> lock(mutex_);
-    ++count_;
+    const auto at = live_.emplace(live_.end());
+    try {
+      *at = std::thread([this, at, body = std::move(body)]() mutable {
+        body();
+        body.clear();  // what it holds must be gone before Shutdown returns
+        End(at);
+      });
+    } catch (...) {
+      live_.erase(at);
+      throw;
+    }
   }
-  void End() {
-    std::lock_guard<std::mutex> lock(mutex_);
-    if (--count_ == 0) none_left_.notify_all();
-  }
+
   void WaitForNone() {
-    std::unique_lock<std::mutex> lock(mutex_);
-    none_left_.wait(lock, [this] { return count_ == 0; });
+    {
+      std::unique_lock<std::mutex> lock(mutex_);
+      none_left_.wait(lock, [this] { return live_.empty(); });
+    }
+    JoinEnded();
   }
 
  private:
+  using Threads = std::list<std::thread>;
+
+  void End(Threads::iterator at) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    ended_.splice(ended_.end(), live_, at);
+    if (live_.empty()) none_left_.notify_all();
+  }
+
+  void JoinEnded() {
+    Threads ended;
+    {
+      std::lock_guard<std::mutex> lock(mutex_);
+      ended.swap(ended_);
+    }
+    for (std::thread& thread : ended) thread.join();
+  }
+
   std::mutex mutex_;
   std::condition_variable none_left_;
-  int count_ = 0;  // guarded by mutex_
+  Threads live_, ended_;  // guarded by mutex_
 };
 
 LiveThreads& live_threads() {
-  static LiveThreads& threads = *new LiveThreads;  // outlives detached threads
+  static LiveThreads& threads = *new LiveThreads;  // outlives its threads
   return threads;
 }
 
@@ -85,25 +118,13 @@ LiveThreads& live_threads() {
 // one-processor machine would queue.
 class ThreadPerTask final : public Executor {
  public:
-  void Post(boost::function<void()> task) override {
-    live_threads().Begin();
-    try {
-      std::thread([task = std::move(task)]() mutable {
-        task();
-        task.clear();  // what it holds must be gone before Shutdown returns
-        live_threads().End();
-      }).detach();
-    } catch (...) {
-      live_threads().End();
-      throw;
-    }
-  }
+  void Post(boost::function<void()> task) override { live_threads().Start(std::move(task)); }
 };
 
 }  // namespace
 
 Executor& GetCPUBoundExecutor() {
-  static ThreadPerTask& executor = *new ThreadPerTask;  // outlives detached threads
+  static ThreadPerTask& executor = *new ThreadPerTask;  // outlives its threads
   return executor;
 }
 
@@ -116,11 +137,8 @@ void Shutdown() {
 }
 
 namespace internal {
-void BeginThread() {
-  live_threads().Begin();
-}
-void EndThread() {
-  live_threads().End();
+void StartThread(boost::function<void()> body) {
+  live_threads().Start(std::move(body));
 }
 }  // namespace internal
 

@@ -1,11 +1,13 @@
 #pragma once
 
+#include <boost/function.hpp>
+
 // What the sources of the threads share.
 namespace tessel::threads::internal {
 
-// Around the life of every thread that runs tasks; Shutdown waits for them.
-void BeginThread();
-void EndThread();
+// Runs `body` on a thread of its own, until whose end Shutdown waits. Throws std::system_error
+// where there is no thread.
+void StartThread(boost::function<void()> body);
 
 // Ends the queues of all single-threaded executors; their threads end when those are done. Until
 // FinishEnding, executors are borrowed with their queue ended.
