@@ -20,7 +20,7 @@ class FfmpegReader final : public ClipReader {
  public:
   explicit FfmpegReader(std::shared_ptr<const FrameList> list)
       : info_(list->info), list_(std::move(list)), to_pixels_(info_) {
-    finder_.emplace(info_.path, list_->index);
+    Find();
   }
   explicit FfmpegReader(std::unique_ptr<FirstPass> first_pass)
       : info_(first_pass->promised()),
@@ -99,8 +99,10 @@ class FfmpegReader final : public ClipReader {
     ahead_.reset();
     list_ = first_pass_->Complete();
     first_pass_.reset();
-    finder_.emplace(info_.path, list_->index);
+    Find();
   }
+
+  void Find() { finder_.emplace(info_.path, list_->index, !list_->info.warning.empty()); }
 
   const ClipInfo info_;
   std::shared_ptr<const PromisedFrames> promised_;  // null of a clip that was decoded at once
@@ -132,10 +134,7 @@ std::unique_ptr<ClipReader> ClipReader::Open(const std::string& path,
     }
   }
   FrameList list;
-  {
-    Decoder decoder(path);
-    list.index = ScanFrames(path, decoder, list.info);
-  }
+  list.index = ScanFrames(path, list.info);
   return std::make_unique<FfmpegReader>(std::make_shared<const FrameList>(std::move(list)));
 }
 

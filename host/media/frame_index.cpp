@@ -4,6 +4,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
+#include <optional>
 
 namespace calmframe::media {
 namespace {
@@ -104,17 +105,7 @@ std::int64_t PromisedFrames(const Decoder& decoder) {
   return promised;
 }
 
-// Of a stream that was decoded to its end. One thread marks every frame in time, and the same in
-// every run.
-int DamageOf(const std::string& path, const Decoder& decoder) {
-  if (!decoder.complained()) return decoder.damage();
-  Decoder alone(path, 1);
-  while (alone.Next()) {
-  }
-  return alone.damage() > 0 ? alone.damage() : decoder.damage();
-}
-
-std::string DamageLine(const std::string& path, const Decoder& decoder, std::size_t frames) {
+std::string DamageLine(const Decoder& decoder, std::size_t frames) {
   const std::int64_t promised = PromisedFrames(decoder);
   const auto count = static_cast<std::int64_t>(frames);
   // Packed streams promise a frame or two more than they hold.
@@ -124,8 +115,8 @@ std::string DamageLine(const std::string& path, const Decoder& decoder, std::siz
     return "damaged or cut short, " + std::to_string(count) + " of " + std::to_string(promised) +
            " frames decode";
   }
-  if (const int damage = DamageOf(path, decoder); damage > 0) {
-    return "damaged in " + std::to_string(damage) + " places, " + std::to_string(count) +
+  if (decoder.damage() > 0) {
+    return "damaged in " + std::to_string(decoder.damage()) + " places, " + std::to_string(count) +
            " frames decode";
   }
   const AVFormatContext& container = decoder.container();
@@ -235,16 +226,26 @@ ClipInfo FrameScan::Finish() {
     throw Failure(Failure::Side::input, path_ + ": no frame of its video stream decodes");
   }
   ClipInfo info = InfoOf(path_, decoder_, std::move(times_), *first_, aspect_, fields_);
-  const std::string damage = DamageLine(path_, decoder_, index_.size());
+  const std::string damage = DamageLine(decoder_, index_.size());
   if (!damage.empty()) info.warning = path_ + ": " + damage;
   return info;
 }
 
-FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info, std::size_t most) {
-  FrameScan scan(path, decoder, most);
-  while (const FramePtr frame = decoder.Next()) scan.Add(*frame);
-  info = scan.Finish();
-  return scan.TakeIndex();
+FrameIndex ScanFrames(const std::string& path, ClipInfo& info, std::size_t most) {
+  const auto scan = [&](int threads) -> std::optional<FrameIndex> {
+    Decoder decoder(path, threads);
+    const auto is_damaged = [&] { return decoder.complained() || decoder.damage() > 0; };
+    FrameScan found(path, decoder, most);
+    while (const FramePtr frame = decoder.Next()) {
+      if (threads != 1 && is_damaged()) return {};
+      found.Add(*frame);
+    }
+    if (threads != 1 && is_damaged()) return {};
+    info = found.Finish();
+    return found.TakeIndex();
+  };
+  if (std::optional<FrameIndex> index = scan(0)) return *std::move(index);
+  return *scan(1);
 }
 
 bool FrameFinder::BeginsAs(const ClipInfo& info) {

@@ -48,8 +48,8 @@ class FrameScan {
 
   // Throws Failure (input) where there are too many.
   void Add(const AVFrame& frame);
-  // After the decoder's end: the info, with a warning where the stream is damaged. Throws Failure
-  // (input) if there was no frame.
+  // After the decoder's end: the info, with a warning where the stream is damaged, which counts
+  // every place only of a decoder with one thread. Throws Failure (input) if there was no frame.
   ClipInfo Finish();
   FrameIndex TakeIndex() { return std::move(index_); }
 
@@ -65,18 +65,19 @@ class FrameScan {
 };
 
 // Decodes everything once: a container's own count and times are promises, this is what is there.
+// Decodes a stream that isn't whole again, on one thread: several threads mend or lose a damaged
+// frame as it happens, one marks each in time and does the same in every run.
 // Fills info, with a warning where the stream is damaged. Throws Failure (input) if no frame
 // decodes, or more than `most`.
-FrameIndex ScanFrames(const std::string& path, Decoder& decoder, ClipInfo& info,
-                      std::size_t most = kMaximumFrames);
+FrameIndex ScanFrames(const std::string& path, ClipInfo& info, std::size_t most = kMaximumFrames);
 
 // Frames by number. Ascending numbers decode on; others decode from the nearest keyframe whose
 // frames prove, by time stamp and fingerprint, to be those of the index, or else from the start.
 class FrameFinder {
  public:
-  // `index` must outlive this.
-  FrameFinder(const std::string& path, const FrameIndex& index)
-      : path_(path), decoder_(path), index_(index) {}
+  // `index` must outlive this. Frames of a damaged stream come as indexed from one thread alone.
+  FrameFinder(const std::string& path, const FrameIndex& index, bool damaged)
+      : path_(path), decoder_(path, damaged ? 1 : 0), index_(index) {}
 
   // Before any frame was asked for: whether the stream and its first frame are those that the index
   // and the info tell of. Not so where it is another clip, or this processor's decoder gives other

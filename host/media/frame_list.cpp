@@ -10,9 +10,9 @@ namespace {
 
 using tessel::filesupport::StreamError;
 
-// 1: the first. Goes up with every change of what stands in the bytes, and of how ScanFrames
-// numbers frames or what it tells of them.
-constexpr std::uint32_t kVersion = 1;
+// 2: damaged streams are read by one thread. Goes up with every change of what stands in the bytes,
+// and of how ScanFrames numbers frames or what it tells of them.
+constexpr std::uint32_t kVersion = 2;
 
 constexpr std::size_t kLongestText = 200;
 // Of a frame in the inflated bytes: two times, the fingerprint, the keyframe's mark.

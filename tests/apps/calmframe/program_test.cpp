@@ -351,8 +351,7 @@ TEST_F(ProgramTest, ADamagedClipIsToldOfInEveryRun) {
   const std::string first = Run(work + "> a.y4m").text;
   EXPECT_THAT(first, HasSubstr("cut.avi: damaged or cut short, "));
   EXPECT_EQ(Run(work + "> b.y4m").text, first);
-  // FFmpeg's threads mend the frame that was cut off in more than one way.
-  EXPECT_EQ(Content("b.y4m").size(), Content("a.y4m").size());
+  EXPECT_TRUE(Content("b.y4m") == Content("a.y4m"));
   EXPECT_EQ(Run(work + "--smoothness 10 > c.y4m").text, first);
 }
 
@@ -361,7 +360,14 @@ TEST_F(ProgramTest, ADamagedClipIsToldOfInEveryRun) {
 TEST_F(ProgramTest, DamageThatTheAnalysisMeetsIsToldAsIfItHadBeenSeenBefore) {
   MakeClip("in.mp4", 320, 240, 60);
   std::string bytes = Content("in.mp4");
-  bytes.replace(bytes.find("mdat") + (bytes.size() / 3), 40, 40, 'x');
+  const auto unit_size = [&](std::size_t at) {  // behind its own size, of four bytes
+    std::size_t size = 0;
+    for (int i = 0; i < 4; ++i) size = 256 * size + static_cast<std::uint8_t>(bytes[at + i]);
+    return size;
+  };
+  std::size_t unit = bytes.find("mdat") + 4;
+  for (int before = 0; before < 30; ++before) unit += 4 + unit_size(unit);
+  bytes.replace(unit + 4 + unit_size(unit) / 3, 40, 40, 'x');  // of one picture, and not its start
   MakeFile("in.mp4", bytes);
   const auto count = [](const std::string& text, const std::string& part) {
     std::size_t found = 0;
@@ -370,15 +376,14 @@ TEST_F(ProgramTest, DamageThatTheAnalysisMeetsIsToldAsIfItHadBeenSeenBefore) {
   };
   const Outcome outcome = Run("stabilize in.mp4 - > out.y4m");
   EXPECT_EQ(outcome.code, 0) << outcome.text;
-  EXPECT_EQ(count(outcome.text, "in.mp4: damaged "), 1u) << outcome.text;
+  EXPECT_EQ(count(outcome.text, "in.mp4: damaged in "), 1u) << outcome.text;
   EXPECT_EQ(count(outcome.text, "analyzing    0 %"), 1u) << outcome.text;
   EXPECT_EQ(count(outcome.text, "analyzing  100 %"), 1u) << outcome.text;
   const std::string y4m = Content("out.y4m");
   EXPECT_EQ(count(y4m, "YUV4MPEG2"), 1u);
-  const std::size_t frames = count(y4m, "FRAME\n");
-  EXPECT_THAT(frames, ::testing::AnyOf(59u, 60u));  // the damaged one may be beyond help
+  EXPECT_EQ(count(y4m, "FRAME\n"), 60u);
   EXPECT_EQ(Run("stabilize in.mp4 out.mp4 --quiet").code, 0);
-  EXPECT_EQ(ClipReader::Open(Path("out.mp4"))->info().frame_count, frames);
+  EXPECT_EQ(ClipReader::Open(Path("out.mp4"))->info().frame_count, 60u);
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "out.mp4", "out.y4m"));
 }
 
