@@ -6,6 +6,9 @@
 
 namespace kelp::effect {
 
+// For a host's transfer(): over what is there, at full opacity, straight alpha.
+inline constexpr HX_TransferMode kOver{HX_TRANSFER_IN_FRONT, 0, 255, 0, 32768};
+
 // A frame buffer of the effect's own, for its scope; holds its suite as long. Throws the host's
 // code when it can't be had.
 class ScopedWorld {

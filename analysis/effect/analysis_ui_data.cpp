@@ -13,6 +13,7 @@
 namespace kelp::analysis::effect {
 namespace {
 
+using kelp::effect::kOver;
 using kelp::effect::ThrowIfFailed;
 
 // Of a point at full resolution, pixels. The stroke lies on the circle, so that a unit of its own
@@ -23,8 +24,6 @@ constexpr double kRadius = 1.1 * kUnit;
 constexpr double kHotRadius = 1.25 * kUnit;  // selected, or under the mouse
 
 constexpr double kFarthest = 20000;  // of a side of a rectangle that the host is told
-
-constexpr HX_TransferMode kOver{HX_TRANSFER_IN_FRONT, 0, 255, 0, 32768};
 
 double ValueOf(const HX_Ratio& ratio) {
   return ratio.num > 0 && ratio.den > 0 ? static_cast<double>(ratio.num) / ratio.den : 1.0;

@@ -10,6 +10,7 @@
 namespace kelp::analysis::effect {
 namespace {
 
+using kelp::effect::kOver;
 using kelp::effect::ScopedWorld;
 using kelp::effect::ThrowIfFailed;
 using tesselui::drawbot::Color;
@@ -18,8 +19,6 @@ constexpr std::int32_t kTextRoom = 80;      // pixels beside the text, both side
 constexpr std::int32_t kWidestText = 1200;  // a longer one may be wider than the frame
 constexpr double kRise = -24.0;             // of the band from the middle, at full resolution
 constexpr double kSlant = 1.414;            // of a stripe: its run to its rise
-
-constexpr HX_TransferMode kOver{HX_TRANSFER_IN_FRONT, 0, 255, 0, 32768};
 
 std::int32_t Ceil(double value) {
   return static_cast<std::int32_t>(std::ceil(value));

@@ -52,12 +52,12 @@ constexpr const char* kLiterals[] = {
     nullptr};
 static_assert(std::size(kLiterals) == kStringMinuteLeft + 2);
 
-constexpr HX_StringTable kTable = {std::size(kLiterals), 4700, kLiterals};
+constexpr HX_StringTable kStrings = {std::size(kLiterals), 4700, kLiterals};
 
 }  // namespace
 
 const HX_StringTable& StabilizerStringTable() {
-  return kTable;
+  return kStrings;
 }
 
 const char* StabilizerStatusLiteral(std::int32_t status) {
