@@ -16,6 +16,13 @@ function(calmframe_library name)
   endif()
   target_include_directories(${name} PUBLIC "${CMAKE_SOURCE_DIR}")
   target_link_libraries(${name} PUBLIC ${ARG_LINKS})
+  # A source that is compiled for every instruction set includes itself, so it can't be joined with others.
+  foreach(source IN LISTS ARG_SOURCES)
+    file(STRINGS "${source}" includes_itself REGEX "define HWY_TARGET_INCLUDE" LIMIT_COUNT 1)
+    if(includes_itself)
+      set_source_files_properties("${source}" PROPERTIES SKIP_UNITY_BUILD_INCLUSION ON)
+    endif()
+  endforeach()
 endfunction()
 
 function(calmframe_program name)
