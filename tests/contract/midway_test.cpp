@@ -1,7 +1,6 @@
 #include <functional>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "tests/contract/played_plugin.h"
 #include "tests/support/held_work.h"

@@ -14,9 +14,6 @@
 namespace calmframe::host {
 namespace {
 
-using testing::ElementsAre;
-using testing::HasSubstr;
-
 class Tour : public PlayedPlugin {
  protected:
   // The source's frame 7 is shown as it is, on both paths.
@@ -156,7 +153,8 @@ TEST_F(Tour, ASourceOfAnotherSizeIsToldOnceAndAnalysedAnew) {
   const auto renderer = effect.MakeRenderer();
   layer.Resize(160, 120);
   for (int i = 0; i < 3; ++i) session().Tick();
-  EXPECT_THAT(effect.TakeMessages(), ElementsAre(HasSubstr("from 320x240 to 160x120")));
+  EXPECT_THAT(effect.TakeMessages(),
+              testing::ElementsAre(testing::HasSubstr("from 320x240 to 160x120")));
   EXPECT_TRUE(renderer->Planned({7}).pixels);
   EXPECT_TRUE(Enabled(effect, kAnalyze));
   layer.Resize(1, 1);

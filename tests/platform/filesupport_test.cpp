@@ -5,7 +5,6 @@
 #include <boost/logic/tribool.hpp>
 #include <fstream>
 #include <iterator>
-#include <limits>
 #include <random>
 #include <string>
 #include <tuple>
