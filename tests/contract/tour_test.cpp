@@ -93,7 +93,7 @@ TEST_F(Tour, PathsDepthsAndPartsAgree) {
 }
 
 TEST_F(Tour, AnEffectBeneathMakesItStaleOneAboveDoesNot) {
-  Effect& effect = Steady();
+  Effect& effect = Steady({96, 64, 8, "beneath"});
   const auto& layer = effect.shared()->layer();
   const EffectOperator other = OtherEffect();
   for (const std::size_t position : {1, 0}) {
@@ -197,7 +197,7 @@ TEST_F(Tour, EffectsOnOneClipShareAnAnalysis) {
 // Nothing is written, started or drawn while nothing changes: parameters are read, and the layer's
 // identity.
 TEST_F(Tour, AtRestATickOnlyReads) {
-  Effect& effect = Steady();
+  Effect& effect = Steady({96, 64, 8, "at rest"});
   session().Tick();
   const std::uint64_t generation = effect.shared()->generation();
   Operations::Get().Record(true);
