@@ -42,6 +42,7 @@ class Banner : public PlayedPlugin {
   // look: there is none.
   void ExpectBanner(Effect& effect, const std::optional<Look>& look) {
     const auto renderer = effect.MakeRenderer();
+    const std::int64_t shown_of_source = kShown + effect.shared()->layer()->state()->start_frame;
     for (const std::uint32_t den : {1u, 2u}) {
       for (const int depth : {8, 16, 32, -8, -16}) {  // negative: the direct path
         SCOPED_TRACE("1/" + std::to_string(den) + " at " + std::to_string(depth));
@@ -56,7 +57,8 @@ class Banner : public PlayedPlugin {
           continue;
         }
         if (den == 1) {
-          EXPECT_EQ(Difference(*beneath, *SourceFrame(effect, kShown)) < 0.6, !look->steadied);
+          EXPECT_EQ(Difference(*beneath, *SourceFrame(effect, shown_of_source)) < 0.6,
+                    !look->steadied);
         }
         ExpectBand(*shown, *beneath, *look);
       }
@@ -78,25 +80,25 @@ class Banner : public PlayedPlugin {
     // A little above the middle.
     EXPECT_LT(first + last, height);
     EXPECT_GT(first + last, height / 2);
+    const std::size_t strongest =
+        std::max_element(look.colour.begin(), look.colour.end()) - look.colour.begin();
     int wrong = 0;
     double darkest = 2, brightest = 0;
     const int edge = (last + 1 - first) / 5;
     for (int y = first; y <= last; y += y == first + edge ? last - first - 2 * edge : 1) {
       const float *over = shown.row<float>(y), *under = beneath.row<float>(y);
+      // What was laid over the frame.
+      const auto laid = [&](int x, std::size_t c) {
+        const float *above = over + 4 * x, *below = under + 4 * x;
+        return (above[1 + c] * above[0] - (1 - kOpacity) * below[1 + c] * below[0]) / kOpacity;
+      };
       for (int x = 0; x < width; ++x) {
-        // How bright a colour of the band it is that was laid over the frame.
-        double along = 0, square = 0;
-        Colour band;
-        for (int c = 0; c < 3; ++c) {
-          const float *above = over + 4 * x, *below = under + 4 * x;
-          band[c] = (above[1 + c] * above[0] - (1 - kOpacity) * below[1 + c] * below[0]) / kOpacity;
-          along += band[c] * look.colour[c];
-          square += look.colour[c] * look.colour[c];
-        }
-        const double bright = along / square;
+        const double bright = laid(x, strongest) / look.colour[strongest];
         darkest = std::min(darkest, bright);
         brightest = std::max(brightest, bright);
-        for (int c = 0; c < 3; ++c) wrong += std::abs(band[c] - bright * look.colour[c]) > 0.015;
+        for (std::size_t c = 0; c < 3; ++c) {
+          wrong += std::abs(laid(x, c) - bright * look.colour[c]) > 0.015;
+        }
       }
     }
     EXPECT_EQ(wrong, 0) << "colours";
@@ -106,7 +108,7 @@ class Banner : public PlayedPlugin {
 };
 
 TEST_F(Banner, WorkThatIsUnderWayIsStriped) {
-  Hold drawing, solving;
+  Hold drawing, solving[2];
   SolveStages stages;
   ShakyClip clip{320, 240, 16, "held"};
   clip.on_draw = [&](std::int64_t frame) {
@@ -116,99 +118,97 @@ TEST_F(Banner, WorkThatIsUnderWayIsStriped) {
   ExpectBanner(effect, Look{kBlue, true});
   while (!drawing.Reached(5ms)) session().Tick();
   ExpectBanner(effect, Look{kBlue, true});
-  stages.HoldAt("Begin - RunFactorization()", &solving);
-  drawing.Release();
-  while (!solving.Reached(5ms)) session().Tick();
-  EXPECT_EQ(Session::StatusOf(effect), 5);
-  ExpectBanner(effect, Look{kOrange, true});
-  solving.Release();
-  EXPECT_EQ(Settle(effect), kReady);
-  ExpectBanner(effect, {});
-
-  Hold again;
-  stages.HoldAt("Begin - RunFactorization()", &again);
-  effect.SetParam(kSmoothness, 10);
-  while (!again.Reached(5ms)) session().Tick();
-  EXPECT_EQ(Session::StatusOf(effect), 6);
-  ExpectBanner(effect, Look{kOrange, true});
-  again.Release();
-  EXPECT_EQ(Settle(effect), kReady);
+  for (const int solve : {0, 1}) {  // the first and a later one
+    stages.HoldAt("Begin - RunFactorization()", &solving[solve]);
+    effect.SetParam(kSmoothness, 10 + solve);
+    drawing.Release();
+    while (!solving[solve].Reached(5ms)) session().Tick();
+    EXPECT_EQ(Session::StatusOf(effect), 5 + solve);
+    ExpectBanner(effect, Look{kOrange, true});
+    solving[solve].Release();
+    EXPECT_EQ(Settle(effect), kReady);
+    ExpectBanner(effect, {});
+  }
 }
 
 TEST_F(Banner, WhatWantsTheUsersAnalyzeIsFlat) {
   const auto layer = MakeLayer({320, 240, 26, "flat banners"});
-  Trim(*layer, 0, 16);
+  Trim(*layer, 4, 14);
   Effect& effect = session().Apply(layer);
   ASSERT_TRUE(effect.Press(kCancel).ok());
   ASSERT_EQ(Settle(effect), 1);
   ExpectBanner(effect, Look{kBlue, false});  // nothing is analysed
   ASSERT_TRUE(effect.Press(kAnalyze).ok());
   ASSERT_EQ(Settle(effect), kReady);
-  Trim(*layer, 0, 12);
-  ExpectBanner(effect, {});  // a part of what was analysed
-  Trim(*layer, 0, 26);
-  ExpectBanner(effect, Look{kBlue, false, true});  // the range has changed
-  Trim(*layer, 4, 16);
-  ASSERT_TRUE(effect.Press(kAnalyze).ok());
-  ASSERT_EQ(Settle(effect), kReady);
-  Trim(*layer, 0, 16);
-  ExpectBanner(effect, Look{kBlue, false});  // outside of the range
+  const auto renderer = effect.MakeRenderer();
+  const auto beneath = [&](std::int64_t source_frame) {
+    effect.SetParam(kHideBanner, 1);
+    return renderer->Planned({source_frame - layer->state()->start_frame}).OnLayer();
+  };
+  const auto steady = beneath(10), last = beneath(17);
+  const struct {
+    const char* name;
+    std::int32_t start, length;
+    std::optional<Look> look;
+  } places[] = {{"a part of what was analysed", 4, 10, {}},
+                {"the range has changed", 4, 20, Look{kBlue, false, true}},
+                {"in front of the range", 0, 18, Look{kBlue, false}},
+                {"as it was", 4, 14, {}}};
+  for (const auto& place : places) {
+    SCOPED_TRACE(place.name);
+    Trim(*layer, place.start, place.length);
+    EXPECT_EQ(Enabled(effect, kAnalyze), place.length != 14);
+    ExpectBanner(effect, place.look);
+    EXPECT_EQ(Difference(*beneath(10), *steady), 0);
+    // Behind the range the last frame repeats, in front of it stands the source.
+    if (place.length == 20) {
+      EXPECT_EQ(Difference(*beneath(20), *last), 0);
+    }
+    if (place.start == 0) {
+      EXPECT_EQ(Difference(*beneath(2), *SourceFrame(effect, 2)), 0);
+    }
+  }
 }
 
 TEST_F(Banner, FailuresAreRed) {
-  {
-    Effect& effect = session().Apply(MakeLayer({320, 240, 16, "no frames"}));
-    host().media().faults.null_frame = true;
-    ASSERT_EQ(Settle(effect), 1);
-    host().media().faults.null_frame = false;
-    const auto messages = effect.TakeMessages();
-    EXPECT_THAT(messages, testing::Each("Error receiving synchronous frame."));
-    EXPECT_FALSE(messages.empty());
-    ExpectBanner(effect, Look{kRed, false});  // the analysis failed
-    EXPECT_TRUE(effect.Press(kAnalyze).ok());
-    EXPECT_EQ(Settle(effect), kReady);
-    ExpectBanner(effect, {});
-    session().Remove(effect);
-  }
-  {
-    SolveStages stages;
-    stages.FailAt("Begin - RunCropper()");
-    Effect& effect = session().Apply(MakeLayer({320, 240, 16, "not solved"}));
-    EXPECT_EQ(Settle(effect), 10);
-    EXPECT_FALSE(Enabled(effect, kAnalyze));
-    ExpectBanner(effect, Look{kRed, false});
-    EXPECT_EQ(Settle(effect), 10);  // it is not tried again
-    stages.FailAt("");
-    effect.SetParam(kSmoothness, 49);
-    EXPECT_EQ(Settle(effect), kReady);
-    ExpectBanner(effect, {});
-    session().Remove(effect);
-  }
-  {
-    const auto layer = MakeLayer({320, 240, 16, "refused"});
-    Effect& effect = session().Apply(layer);
-    ASSERT_EQ(Settle(effect), kReady);
-    Refuse(*layer, "Not this layer.");
-    ExpectBanner(effect, Look{kRed, false});
-    session().Tick();
-    EXPECT_TRUE(Enabled(effect, kAnalyze));
-    effect.Press(kAnalyze);
-    EXPECT_THAT(effect.TakeMessages(), testing::ElementsAre(testing::HasSubstr("Not this layer.")));
-    Refuse(*layer, "");
-    ExpectBanner(effect, {});
-    session().Remove(effect);
-  }
-  {
-    ShakyClip clip{320, 240, 16, "thrown about"};
-    clip.tremor = 9;
-    Effect& effect = session().Apply(MakeLayer(clip));
-    effect.SetParam(kFraming, 2);
-    ASSERT_EQ(Settle(effect), kReady);
-    ExpectBanner(effect, Look{kRed, false, true});  // over-cropped
-    effect.SetParam(kFraming, 1);
-    ASSERT_EQ(Settle(effect), kReady);
-    ExpectBanner(effect, {});
-  }
+  SolveStages stages;
+  const auto layer = MakeLayer({320, 240, 16, "thrown about", 9});
+  Effect& effect = session().Apply(layer);
+  host().media().faults.null_frame = true;
+  ASSERT_EQ(Settle(effect), 1);
+  host().media().faults.null_frame = false;
+  const auto messages = effect.TakeMessages();
+  EXPECT_THAT(messages, testing::Each("Error receiving synchronous frame."));
+  EXPECT_FALSE(messages.empty());
+  ExpectBanner(effect, Look{kRed, false});  // the analysis failed
+
+  stages.FailAt("Begin - RunCropper()");
+  EXPECT_TRUE(effect.Press(kAnalyze).ok());
+  EXPECT_EQ(Settle(effect), 10);
+  EXPECT_FALSE(Enabled(effect, kAnalyze));
+  ExpectBanner(effect, Look{kRed, false});
+  EXPECT_EQ(Settle(effect), 10);  // it is not tried again
+  stages.FailAt("");
+  effect.SetParam(kSmoothness, 49);
+  effect.SetParam(kFraming, 1);
+  EXPECT_EQ(Settle(effect), kReady);
+  ExpectBanner(effect, {});
+
+  Refuse(*layer, "Not this layer.");
+  ExpectBanner(effect, Look{kRed, false});
+  session().Tick();
+  EXPECT_TRUE(Enabled(effect, kAnalyze));
+  effect.Press(kAnalyze);
+  EXPECT_THAT(effect.TakeMessages(), testing::ElementsAre(testing::HasSubstr("Not this layer.")));
+  Refuse(*layer, "");
+  ExpectBanner(effect, {});
+
+  effect.SetParam(kFraming, 2);
+  EXPECT_EQ(Settle(effect), kReady);
+  ExpectBanner(effect, Look{kRed, false, true});  // over-cropped
+  effect.SetParam(kFraming, 1);
+  EXPECT_EQ(Settle(effect), kReady);
+  ExpectBanner(effect, {});
 }
 
 }  // namespace

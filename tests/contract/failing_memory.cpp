@@ -11,15 +11,13 @@
 
 namespace {
 
-std::atomic<bool> armed = false, failed_once = false;
+std::atomic<bool> armed = false;
 std::atomic<std::int64_t> counted = 0, first_failing = 0, end_failing = 0;
 
 bool Fails() {
   if (!armed.load(std::memory_order_relaxed)) return false;
   const std::int64_t n = counted.fetch_add(1, std::memory_order_relaxed) + 1;
-  if (n < first_failing || n >= end_failing) return false;
-  failed_once = true;
-  return true;
+  return n >= first_failing && n < end_failing;
 }
 
 void* Allocate(std::size_t size, std::size_t alignment) {
@@ -38,17 +36,12 @@ void FailingMemory::Arm(std::int64_t first, std::int64_t count) {
   counted = 0;
   first_failing = first;
   end_failing = first + count;
-  failed_once = false;
   armed = true;
 }
 
 std::int64_t FailingMemory::Disarm() {
   armed = false;
   return counted;
-}
-
-bool FailingMemory::failed() {
-  return failed_once;
 }
 
 // The other forms go by these.

@@ -10,6 +10,4 @@ class FailingMemory {
   static void Arm(std::int64_t first, std::int64_t count);
   // Allocations since it was armed.
   static std::int64_t Disarm();
-  // Whether one has failed since it was armed.
-  static bool failed();
 };

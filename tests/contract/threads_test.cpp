@@ -4,7 +4,6 @@
 #include <array>
 #include <atomic>
 #include <cstdio>
-#include <cstdlib>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -24,24 +23,18 @@ constexpr std::int64_t kFrames = 30, kMostStart = 4;
 constexpr std::size_t kMostEffects = 4;
 const ShakyClip kClips[] = {{160, 120, kFrames, "played with"}, {128, 96, kFrames, "and another"}};
 
-int Setting(const char* name, int unless_set) {
-  const char* const text = std::getenv(name);
-  return text ? std::atoi(text) : unless_set;
-}
-
 class TourThreads : public PlayedPlugin {
  protected:
   // A user acts on effects, at first one on each of both layers, while other threads render them
   // and read their exports: until `enough`, asked before each act.
   void Storm(std::mt19937& random, const std::function<bool()>& enough) {
     layers_ = {MakeLayer(kClips[0]), MakeLayer(kClips[1])};
-    for (const auto& layer : layers_) Keep(session().Apply(layer));
+    for (const auto& layer : layers_) Keep(&session().Apply(layer));
     ends_ = false;
     std::vector<std::jthread> threads;
     for (int t = 0; t < 4; ++t) {
       threads.emplace_back([this, seed = static_cast<unsigned>(random())] { RenderOn(seed); });
     }
-    threads.emplace_back([this] { ReadExportsOn(99); });
     while (!enough() && !HasFailure()) Act(random);
     Drop(*session().effects().back());  // in the middle of whatever goes on
     ends_ = true;
@@ -64,7 +57,10 @@ class TourThreads : public PlayedPlugin {
       std::unique_ptr<Renderer> renderer;
       {
         const std::shared_lock lock(mutex_);
-        if ((effect = Any(random))) renderer = std::make_unique<Renderer>(host(), effect);
+        if ((effect = Any(random))) {
+          renderer = std::make_unique<Renderer>(host(), effect);
+          ReadExports(*effect);
+        }
       }
       for (unsigned i = 0; renderer && i < random() % 8; ++i) {
         const bool direct = random() % 3 == 0;
@@ -83,28 +79,18 @@ class TourThreads : public PlayedPlugin {
     }
   }
 
-  // A renderer outside of the plug-in; the standing renderer of an effect keeps its block.
-  void ReadExportsOn(unsigned seed) {
-    std::mt19937 random(seed);
-    const PluginExports& exports = host().library().exports();
-    while (!ends_) {
-      const std::shared_lock lock(mutex_);
-      const auto effect = Any(random);
-      if (!effect) continue;
-      const void* block = host().opaque_data().Peek(effect->reference());
-      exports.allow_cuda_rendering(block);
-      std::int32_t words[8];
-      float bounds[4];
-      exports.get_stabilizer_data(block, &words[0], &words[1], &words[2], &words[3], &words[4],
-                                  &words[5], &bounds[0], &bounds[1], &bounds[2], &bounds[3],
-                                  &words[6], &words[7]);
-    }
+  // As a renderer outside of the plug-in; the standing renderer of an effect keeps its block.
+  void ReadExports(const TimelineEffect& effect) {
+    const void* const block = host().opaque_data().Peek(effect.reference());
+    exports().allow_cuda_rendering(block);
+    DataOf(block);
   }
 
-  void Keep(Effect& effect) {
+  void Keep(Effect* effect) {  // null: none was made
+    if (!effect) return;
     ++instances_;
     const std::lock_guard lock(mutex_);
-    standing_.push_back(effect.shared());
+    standing_.push_back(effect->shared());
   }
   void Drop(Effect& effect) {
     const std::lock_guard lock(mutex_);
@@ -143,63 +129,31 @@ class TourThreads : public PlayedPlugin {
     Effect& effect = *effects[random() % effects.size()];
     const bool room = effects.size() < kMostEffects;
     if (faults_ && random() % 8 == 0) SwitchFaults(random);
-    switch (random() % 19) {
-      case 0:
-      case 1:
-        effect.Press(kAnalyze);  // refused where it is disabled
-        break;
-      case 2:
-        effect.Press(kCancel);
-        break;
-      case 3:
-        effect.SetParam(kFraming, 1 + random() % 4);
-        break;
-      case 4:
-        effect.SetParam(kSmoothness, random() % 100);
-        break;
-      case 5:
-        EXPECT_TRUE(effect.Save(&saved_).ok() || faults_);
-        break;
-      case 6:
-        Session::PauseBackgroundWork(random() % 2 == 0);
-        break;
-      case 7:
-        layer->Change([&](LayerState& state) {
-          state.start_frame = static_cast<std::int32_t>(random() % (kMostStart + 1));
-          state.length = static_cast<std::int32_t>(kFrames - kMostStart);
-        });
-        break;
-      case 8:
-        Refuse(*layer, random() % 2 ? "" : "Not now.");
-        break;
-      case 9:
-        if (room) Keep(session().Apply(layer));
-        break;
-      case 10:
-        if (room && !saved_.instance.empty()) Keep(session().Load(layer, saved_));
-        break;
-      case 11:
-        if (Effect* const copy = room ? session().Duplicate(effect, layer) : nullptr) Keep(*copy);
-        break;
-      case 12:
-        if (effects.size() > 1) Drop(effect);
-        break;
-      default:  // as a host's loop does
-        session().Tick();
-        host().WaitForWake(2ms);
-    }
-  }
-
-  // The frames of an effect whose tracks are rounded, as they are in a saved one, anew solved.
-  std::vector<std::shared_ptr<WorldBuffer>> FramesOf(Effect& effect) {
-    effect.SetParam(kSmoothness, 30);  // a solve that failed is tried again with other controls
-    Bring(effect, 2s);
-    SavedEffect saved;
-    EXPECT_TRUE(effect.Save(&saved).ok());
-    effect.SetParam(kSmoothness, 31);
-    EXPECT_EQ(Settle(effect), kReady);
-    const auto renderer = effect.MakeRenderer();
-    return {renderer->Planned({7, 16}).OnLayer(), renderer->Direct({8}).OnLayer()};
+    const std::function<void()> acts[] = {
+        [&] { effect.Press(kAnalyze); },  // refused where it is disabled
+        [&] { effect.Press(kAnalyze); },
+        [&] { effect.Press(kCancel); },
+        [&] { effect.SetParam(kFraming, 1 + random() % 4); },
+        [&] { effect.SetParam(kSmoothness, random() % 100); },
+        [&] { EXPECT_TRUE(effect.Save(&saved_).ok() || faults_); },
+        [&] { Session::PauseBackgroundWork(random() % 2 == 0); },
+        [&] {
+          layer->Change([start = random() % (kMostStart + 1)](LayerState& state) {
+            state.start_frame = static_cast<std::int32_t>(start);
+            state.length = static_cast<std::int32_t>(kFrames - kMostStart);
+          });
+        },
+        [&] { Refuse(*layer, random() % 2 ? "" : "Not now."); },
+        [&] { Keep(room ? &session().Apply(layer) : nullptr); },
+        [&] { Keep(room && !saved_.instance.empty() ? &session().Load(layer, saved_) : nullptr); },
+        [&] { Keep(room ? session().Duplicate(effect, layer) : nullptr); },
+        [&] {
+          if (effects.size() > 1) Drop(effect);
+        }};
+    const std::size_t which = random() % 19;
+    if (which < std::size(acts)) return acts[which]();
+    session().Tick();  // as a host's loop does
+    host().WaitForWake(2ms);
   }
 
   std::vector<boost::shared_ptr<Layer>> layers_;
@@ -235,18 +189,15 @@ TEST_F(TourThreads, ASoakLosesNothingAndLeavesNothing) {
   for (int quarter = 1; quarter <= 4; ++quarter) {
     Storm(random, [&] { return 4 * instances_ >= quarter * wanted; });
     for (const auto& layer : layers_) Trim(*layer, 0, kFrames);
-    std::vector<Effect*> survivors;
-    for (const auto& effect : session().effects()) survivors.push_back(effect.get());
-    for (Effect* effect : survivors) {
+    const std::size_t survivors = session().effects().size();
+    for (std::size_t i = 0; i < survivors; ++i) {
       SCOPED_TRACE("instance " + std::to_string(instances_));
-      const auto frames = FramesOf(*effect);
-      const bool first = effect->shared()->layer() == layers_[0];
+      Effect& effect = *session().effects()[i];
+      const Frames frames = FramesOf(effect);
+      const bool first = effect.shared()->layer() == layers_[0];
       Effect& fresh = session().Load(MakeLayer(kClips[first ? 0 : 1]),
-                                     {kMatchName, effect->shared()->params().Values(), {}});
-      const auto undisturbed = FramesOf(fresh);
-      for (std::size_t i = 0; i < frames.size(); ++i) {
-        EXPECT_EQ(Difference(*frames[i], *undisturbed[i]), 0);
-      }
+                                     {kMatchName, effect.shared()->params().Values(), {}});
+      ExpectSame(frames, FramesOf(fresh));
       session().Remove(fresh);
     }
     while (!session().effects().empty()) Drop(*session().effects().back());

@@ -4,20 +4,15 @@
 #include <cstdlib>
 #include <optional>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "platform/tessel/debug.h"
 #include "tests/contract/played_plugin.h"
-#include "tests/support/held_work.h"
 
 // The real plug-in, played by the host as any plug-in is.
 
 namespace calmframe::host {
 namespace {
-
-using testing::ElementsAre;
-using testing::HasSubstr;
 
 class Tour : public PlayedPlugin {
  protected:
@@ -28,11 +23,6 @@ class Tour : public PlayedPlugin {
       ASSERT_TRUE(frame.pixels);
       EXPECT_EQ(Difference(*frame.pixels, *SourceFrame(effect, 7)), 0);
     }
-  }
-
-  // The outside renderer's view.
-  const void* WarpOf(Effect& effect, std::int32_t frame) {
-    return host().library().exports().get_var_vector(effect.opaque_data(), frame);
   }
 };
 
@@ -79,7 +69,7 @@ TEST_F(Tour, PathsDepthsAndPartsAgree) {
   for (int framing = 1; framing <= 4; ++framing) {
     effect.SetParam(kFraming, framing);
     ASSERT_EQ(Settle(effect), kReady) << framing;
-    EXPECT_EQ(host().library().exports().allow_cuda_rendering(effect.opaque_data()), framing != 4);
+    EXPECT_EQ(exports().allow_cuda_rendering(effect.opaque_data()), framing != 4);
     for (const std::uint32_t den : {1u, 2u}) {
       SCOPED_TRACE(std::to_string(framing) + " at 1/" + std::to_string(den));
       const auto frame = [&](int depth, std::optional<HX_Rect> part = {}) {  // below 0: direct
@@ -102,57 +92,8 @@ TEST_F(Tour, PathsDepthsAndPartsAgree) {
   }
 }
 
-TEST_F(Tour, SmoothnessSolvesAgainAndMaximumScaleOnlyFrames) {
-  SolveStages stages;
-  Effect& effect = session().Apply(MakeLayer());
-  ASSERT_EQ(Settle(effect), kReady);
-  EXPECT_EQ(stages.Take(), "factorization crop ");
-  const void* warp = WarpOf(effect, 5);
-  ASSERT_TRUE(warp);
-  const std::pair<std::int32_t, double> framings[] = {
-      {kMaximumScale, 101}, {kMaximumScale, 150}, {kFraming, 2}, {kCropLessSmoothMore, 100}};
-  for (const auto& [index, value] : framings) {
-    effect.SetParam(index, value);
-    ASSERT_EQ(Settle(effect), kReady) << index << " " << value;
-    EXPECT_EQ(stages.Take(), "crop ") << index << " " << value;
-    EXPECT_EQ(WarpOf(effect, 5), warp) << index << " " << value;
-  }
-  effect.SetParam(kSmoothness, 10);
-  ASSERT_EQ(Settle(effect), kReady);
-  EXPECT_EQ(stages.Take(), "factorization crop ");
-  EXPECT_NE(WarpOf(effect, 5), warp);
-}
-
-// In front of the analysed range stands the source below a banner; behind it the last frame
-// repeats.
-TEST_F(Tour, TrimmedAndExtendedFramesTellTheirState) {
-  const auto layer = MakeLayer();
-  Trim(*layer, 4, 14);
-  Effect& effect = session().Apply(layer);
-  ASSERT_EQ(Settle(effect), kReady);
-  const auto renderer = effect.MakeRenderer();
-  // By the source's frame.
-  const auto shown = [&](std::int64_t frame) {
-    return renderer->Planned({frame - layer->state()->start_frame}).OnLayer();
-  };
-  const auto steady = shown(10), last = shown(17);
-  Trim(*layer, 4, 20);
-  EXPECT_TRUE(Enabled(effect, kAnalyze));
-  EXPECT_GT(Difference(*shown(10), *steady), 0);  // the banner
-  EXPECT_TRUE(effect.SetParam(kHideBanner, 1).ok());
-  EXPECT_EQ(Difference(*shown(10), *steady), 0);
-  EXPECT_EQ(Difference(*shown(20), *last), 0);
-  Trim(*layer, 0, 18);
-  EXPECT_EQ(Difference(*shown(2), *SourceFrame(effect, 2)), 0);
-  EXPECT_TRUE(effect.SetParam(kHideBanner, 0).ok());
-  EXPECT_GT(Difference(*shown(2), *SourceFrame(effect, 2)), 0);
-  Trim(*layer, 4, 14);
-  EXPECT_FALSE(Enabled(effect, kAnalyze));
-  EXPECT_EQ(Difference(*shown(10), *steady), 0);
-}
-
 TEST_F(Tour, AnEffectBeneathMakesItStaleOneAboveDoesNot) {
-  Effect& effect = Steady();
+  Effect& effect = Steady({96, 64, 8, "beneath"});
   const auto& layer = effect.shared()->layer();
   const EffectOperator other = OtherEffect();
   for (const std::size_t position : {1, 0}) {
@@ -192,13 +133,9 @@ TEST_F(Tour, ClipsOfAnyKindComeToAnEnd) {
     EXPECT_EQ(Settle(effect), kReady);
     EXPECT_TRUE(effect.TakeMessages().empty());
     const bool fields = clip.field_type != HX_FIELD_PROGRESSIVE;
-    std::int32_t rows = 0, first = 0, other[6];
-    float bounds[4];
-    EXPECT_TRUE(host().library().exports().get_stabilizer_data(
-        effect.opaque_data(), &rows, &first, &other[0], &other[1], &other[2], &other[3], &bounds[0],
-        &bounds[1], &bounds[2], &bounds[3], &other[4], &other[5]));
-    EXPECT_EQ(rows, (fields ? 2 : 1) * layer->state()->length);
-    EXPECT_EQ(first, (fields ? 2 : 1) * std::max(clip.start, 0));
+    const auto data = DataOf(effect.opaque_data());
+    EXPECT_EQ(data[0], (fields ? 2 : 1) * layer->state()->length);
+    EXPECT_EQ(data[1], (fields ? 2 : 1) * std::max(clip.start, 0));
     const auto renderer = effect.MakeRenderer();
     for (const bool direct : {false, true}) {
       RenderRequest request{std::max<std::int64_t>(-clip.start, 0)};
@@ -216,7 +153,8 @@ TEST_F(Tour, ASourceOfAnotherSizeIsToldOnceAndAnalysedAnew) {
   const auto renderer = effect.MakeRenderer();
   layer.Resize(160, 120);
   for (int i = 0; i < 3; ++i) session().Tick();
-  EXPECT_THAT(effect.TakeMessages(), ElementsAre(HasSubstr("from 320x240 to 160x120")));
+  EXPECT_THAT(effect.TakeMessages(),
+              testing::ElementsAre(testing::HasSubstr("from 320x240 to 160x120")));
   EXPECT_TRUE(renderer->Planned({7}).pixels);
   EXPECT_TRUE(Enabled(effect, kAnalyze));
   layer.Resize(1, 1);
@@ -238,9 +176,7 @@ TEST_F(Tour, ALayerOfOnePixelDoesNothing) {
   EXPECT_TRUE(effect.Press(kAnalyze).ok());
   EXPECT_EQ(Settle(effect), 0);
   ExpectSource(effect, *effect.MakeRenderer());
-  SavedEffect saved;
-  EXPECT_TRUE(effect.Save(&saved).ok());
-  EXPECT_TRUE(session().Load(MakeLayer(clip), saved).creation().ok());
+  EXPECT_TRUE(session().Load(MakeLayer(clip), Saved(effect)).creation().ok());
 }
 
 TEST_F(Tour, EffectsOnOneClipShareAnAnalysis) {
@@ -261,7 +197,7 @@ TEST_F(Tour, EffectsOnOneClipShareAnAnalysis) {
 // Nothing is written, started or drawn while nothing changes: parameters are read, and the layer's
 // identity.
 TEST_F(Tour, AtRestATickOnlyReads) {
-  Effect& effect = Steady();
+  Effect& effect = Steady({96, 64, 8, "at rest"});
   session().Tick();
   const std::uint64_t generation = effect.shared()->generation();
   Operations::Get().Record(true);

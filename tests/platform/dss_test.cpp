@@ -2,95 +2,71 @@
 
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <limits>
-#include <numeric>
-#include <random>
 #include <vector>
 
 namespace {
 
-// A symmetric matrix as the solver takes it, kept dense beside it for the reference.
-struct System {
-  int n;
-  std::vector<DssInt> starts, columns;
-  std::vector<double> values, dense;
-};
-
-// Random band matrix, made positive definite by its diagonal.
-System RandomSystem(int n, int band, unsigned seed) {
-  std::mt19937 random(seed);
-  std::uniform_real_distribution<double> entry(-1, 1);
-  System s{n, {1}, {}, {}, std::vector<double>(static_cast<size_t>(n * n))};
-  for (int r = 0; r < n; ++r) {
-    for (int c = r; c < std::min(n, r + band + 1); ++c) {
-      const double value = c == r ? 2.0 * band + 1 : entry(random);
-      s.columns.push_back(c + 1);
-      s.values.push_back(value);
-      s.dense[r * n + c] = s.dense[c * n + r] = value;
-    }
-    s.starts.push_back(static_cast<DssInt>(s.columns.size()) + 1);
-  }
-  return s;
-}
+// | 10 1 2 3 |
+// |  1 5 0 0 |
+// |  2 0 6 0 |
+// |  3 0 0 7 |: its upper triangle by rows. The first column is best eliminated last.
+const std::vector<DssInt> kStarts = {1, 5, 6, 7, 8}, kColumns = {1, 2, 3, 4, 2, 3, 4};
+const std::vector<double> kValues = {10, 1, 2, 3, 5, 6, 7};
 
 class DssTest : public ::testing::Test {
  protected:
-  void Define(const System& s) {
-    ASSERT_EQ(dss_create(handle_, MKL_DSS_DEFAULTS), 0);
-    ASSERT_EQ(dss_define_structure(handle_, MKL_DSS_SYMMETRIC, s.starts.data(), s.n, s.n,
-                                   s.columns.data(), static_cast<DssInt>(s.columns.size())),
-              0);
-    ASSERT_EQ(dss_reorder(handle_, MKL_DSS_DEFAULTS, nullptr), 0);
+  DssTest() { EXPECT_EQ(dss_create(handle_, MKL_DSS_DEFAULTS), 0); }
+  ~DssTest() override { dss_delete(handle_, MKL_DSS_DEFAULTS); }
+  DssInt Define(const std::vector<DssInt>& columns) {
+    return dss_define_structure(handle_, MKL_DSS_SYMMETRIC, kStarts.data(), 4, 4, columns.data(),
+                                7);
   }
+  DssInt Reorder() { return dss_reorder(handle_, MKL_DSS_DEFAULTS, nullptr); }
   DssInt Factor(const std::vector<double>& values) {
     return dss_factor_real(handle_, MKL_DSS_POSITIVE_DEFINITE, values.data());
   }
-  ~DssTest() override { dss_delete(handle_, MKL_DSS_DEFAULTS); }
+  DssInt Solve(const std::vector<double>& b, std::vector<double>* x) {
+    x->resize(b.size());
+    return dss_solve_real(handle_, MKL_DSS_DEFAULTS, b.data(), static_cast<DssInt>(b.size() / 4),
+                          x->data());
+  }
   DssHandle handle_ = nullptr;
+  std::vector<double> x_;
 };
 
 TEST_F(DssTest, OneStructureServesManyFactorizations) {
-  System s = RandomSystem(60, 7, 1);
-  Define(s);
+  ASSERT_EQ(Define(kColumns), 0);
+  ASSERT_EQ(Reorder(), 0);
+  const double expected[] = {1, -2, 3, -1, 0, 1, 0, 2};
   for (const double scale : {1.0, 3.0}) {
-    for (double& v : s.values) v *= scale;
-    for (double& v : s.dense) v *= scale;
-    ASSERT_EQ(Factor(s.values), 0);
-    std::vector<double> b(2 * 60), x(2 * 60);
-    for (int i = 0; i < 120; ++i) b[i] = std::sin(i);
-    ASSERT_EQ(dss_solve_real(handle_, MKL_DSS_DEFAULTS, b.data(), 2, x.data()), 0);
-    for (int i = 0; i < 120; ++i) {
-      const double* of = &x[i / 60 * 60];
-      EXPECT_NEAR(std::inner_product(of, of + 60, &s.dense[i % 60 * 60], 0.0), b[i], 1e-12);
-    }
+    std::vector<double> values = kValues;
+    for (double& v : values) v *= scale;
+    ASSERT_EQ(Factor(values), 0);
+    ASSERT_EQ(Solve({11, -9, 20, -4, 7, 5, 0, 14}, &x_), 0);
+    for (int i = 0; i < 8; ++i) EXPECT_NEAR(x_[i], expected[i] / scale, 1e-15) << i;
   }
 }
 
 TEST_F(DssTest, NotPositiveDefiniteIsAFailureAndTheHandleStaysUsable) {
-  System s = RandomSystem(40, 3, 2);
-  Define(s);
+  ASSERT_EQ(Define(kColumns), 0);
+  ASSERT_EQ(Reorder(), 0);
   for (const double bad : {0.0, -5.0, std::numeric_limits<double>::quiet_NaN()}) {
-    std::vector<double> values = s.values;
-    values[s.starts[20] - 1] = bad;
+    std::vector<double> values = kValues;
+    values[5] = bad;  // on the diagonal
     EXPECT_EQ(Factor(values), MKL_DSS_NOT_POSITIVE_DEFINITE) << bad;
-    std::vector<double> b(40, 1.0), x(40);
-    EXPECT_EQ(dss_solve_real(handle_, MKL_DSS_DEFAULTS, b.data(), 1, x.data()), MKL_DSS_STATE_ERR);
+    EXPECT_EQ(Solve({1, 1, 1, 1}, &x_), MKL_DSS_STATE_ERR);
   }
-  EXPECT_EQ(Factor(s.values), 0);
+  EXPECT_EQ(Factor(kValues), 0);
 }
 
 TEST_F(DssTest, CallsOutOfOrderAndBadStructuresAreRefused) {
-  EXPECT_EQ(dss_reorder(handle_, MKL_DSS_DEFAULTS, nullptr), MKL_DSS_STATE_ERR);
-  ASSERT_EQ(dss_create(handle_, MKL_DSS_DEFAULTS), 0);
-  EXPECT_EQ(Factor({1.0}), MKL_DSS_STATE_ERR);
-  const DssInt starts[] = {1, 2, 3};
-  const DssInt no_diagonal[] = {2, 2};
-  EXPECT_EQ(dss_define_structure(handle_, MKL_DSS_SYMMETRIC, starts, 2, 2, no_diagonal, 2),
-            MKL_DSS_STRUCTURE_ERR);
-  const DssInt outside[] = {1, 3};
-  EXPECT_EQ(dss_define_structure(handle_, MKL_DSS_SYMMETRIC, starts, 2, 2, outside, 2),
-            MKL_DSS_STRUCTURE_ERR);
+  EXPECT_EQ(Reorder(), MKL_DSS_STATE_ERR);
+  EXPECT_EQ(Factor(kValues), MKL_DSS_STATE_ERR);
+  EXPECT_EQ(Define({1, 2, 3, 4, 3, 3, 4}), MKL_DSS_STRUCTURE_ERR) << "no diagonal";
+  EXPECT_EQ(Define({1, 2, 3, 5, 2, 3, 4}), MKL_DSS_STRUCTURE_ERR) << "outside";
+  dss_delete(handle_, MKL_DSS_DEFAULTS);
+  EXPECT_EQ(Reorder(), MKL_DSS_STATE_ERR);
 }
 
 }  // namespace

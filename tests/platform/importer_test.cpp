@@ -50,18 +50,14 @@ TEST(ImporterTest, UnregisteringWaitsForARunningCallback) {
 }
 
 TEST(ImporterTest, ACallbackMayDropTheLastOwnerOfAnother) {
-  struct Owner {
-    ~Owner() { UnregisterPauseCallback(id); }
-    utility::Guid id;
-  };
   std::atomic<int> calls{0};
-  std::vector<std::unique_ptr<Owner>> owners;
+  std::vector<std::shared_ptr<void>> owners;
   for (int i = 0; i < 4; ++i) {
-    owners.push_back(std::make_unique<Owner>());
-    owners.back()->id = RegisterPauseCallback([&](bool) {
+    const utility::Guid id = RegisterPauseCallback([&](bool) {
       ++calls;
       owners.clear();
     });
+    owners.emplace_back(nullptr, [id](void*) { UnregisterPauseCallback(id); });
   }
   PauseBackgroundWork(true);
   PauseBackgroundWork(false);

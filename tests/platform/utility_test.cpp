@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <clocale>
-#include <cmath>
 #include <cstring>
 #include <limits>
 #include <set>
@@ -13,12 +12,6 @@
 namespace tessel::utility {
 namespace {
 
-Guid FromHex(const std::string& text) {
-  Guid guid;
-  EXPECT_TRUE(Guid::Parse(text, &guid)) << text;
-  return guid;
-}
-
 Guid StateOfSeed(std::uint8_t seed) {
   Guid::Bytes bytes{};
   bytes[0] = bytes[8] = seed;
@@ -26,14 +19,14 @@ Guid StateOfSeed(std::uint8_t seed) {
 }
 
 TEST(GuidTest, TextFormRoundTripsAndKeepsTheOrderOfBytes) {
-  const Guid guid = FromHex("00112233-4455-6677-8899-aAbBcCdDeEfF");
+  const Guid guid = Guid::FromText("00112233-4455-6677-8899-aAbBcCdDeEfF");
   for (std::size_t i = 0; i < 16; ++i) EXPECT_EQ(guid.bytes()[i], i * 0x11);
   EXPECT_EQ(guid.ToText(), "00112233-4455-6677-8899-aabbccddeeff");
   EXPECT_EQ(Guid::FromText(guid.ToText()), guid);
   EXPECT_EQ(Guid().ToText(), "00000000-0000-0000-0000-000000000000");
   EXPECT_TRUE(Guid::FromText(Guid().ToText()).IsNil());
-  EXPECT_LT(FromHex("00ffffff-ffff-ffff-ffff-ffffffffffff"),
-            FromHex("01000000-0000-0000-0000-000000000000"));
+  EXPECT_LT(Guid::FromText("00ffffff-ffff-ffff-ffff-ffffffffffff"),
+            Guid::FromText("01000000-0000-0000-0000-000000000000"));
 }
 
 TEST(GuidTest, OtherTextsAreHashed) {
@@ -59,11 +52,11 @@ TEST(MixHashTest, PublishedValuesStandForEver) {
   const std::string fox = "The quick brown fox jumps over the lazy dog";
   EXPECT_EQ(MixHash(Guid(), fox.data(), fox.size()).ToText(),
             "6c1b07bc-7bbc-4be3-4793-9ac4a93c437a");
-  EXPECT_EQ(MixHash(StateOfSeed(42), "foo", 3), FromHex("f2537063-519d-56f4-a99a-b0eed8b579a2"));
+  EXPECT_EQ(MixHash(StateOfSeed(42), "foo", 3).ToText(), "f2537063-519d-56f4-a99a-b0eed8b579a2");
   // Pieces in a row, and zeros that must not vanish.
-  EXPECT_EQ(MixHash(MixHash(Guid(), "foo", 3), "bar", 3),
-            FromHex("9aa9dddb-addb-f3de-901b-2d874f496450"));
-  EXPECT_EQ(MixHash(Guid(), "\0\0\0\0", 4), FromHex("bc764cd8-ddf7-a0cf-f126-f51c16239658"));
+  EXPECT_EQ(MixHash(MixHash(Guid(), "foo", 3), "bar", 3).ToText(),
+            "9aa9dddb-addb-f3de-901b-2d874f496450");
+  EXPECT_EQ(MixHash(Guid(), "\0\0\0\0", 4).ToText(), "bc764cd8-ddf7-a0cf-f126-f51c16239658");
 }
 
 TEST(MixHashTest, OrderBordersAndEveryByteCount) {
@@ -121,9 +114,6 @@ TEST(UtilityTest, NumbersHaveAPointInEveryLocale) {
 TEST(UtilityTest, ChecksumAndClock) {
   EXPECT_EQ(CRC32("123456789", 9), 0xCBF43926u);
   EXPECT_EQ(CRC32("6789", 4, CRC32("12345", 5)), 0xCBF43926u);
-  const std::uint64_t from = HighPrecisionTime::Now(), to = HighPrecisionTime::Now();
-  EXPECT_NE(from, 0u);
-  EXPECT_GE(HighPrecisionTime::Seconds(from, to), 0);
   EXPECT_EQ(HighPrecisionTime::Seconds(5000000000u, 2000000000u), -3.0);
 }
 
