@@ -35,11 +35,10 @@ TEST(FadeWeight, TracksRiseAndFallUnlessTheClipCutsThem) {
   EXPECT_EQ(fade_weight({7, false, false}, 3, 0), 1.0);  // no flanks
 }
 
-const auto shifted = [](int, point2 p) { return point2{p.x + 10, p.y - 5}; };
-
-// Of a slot: 100 pixels from its neighbours, moving by a pixel a frame.
+// Of a slot: 100 pixels from its neighbours, moving by a pixel a frame, stabilized 10 to the right.
 void add_moving(stabilizer_global& global, int slot, int first, int last) {
   const auto at = [slot](int f) { return point2{100.0 * slot + f, 2.0 * f}; };
+  const auto shifted = [](int, point2 p) { return point2{p.x + 10, p.y - 5}; };
   add_track(global, slot, first, last, at, shifted);
 }
 
@@ -98,17 +97,18 @@ factorization_window overlapping(const stabilizer_global& global) {
 
 TEST(BlendedDisplacementsTest, AWindowsStartMovesFromTheOldSolutionToTheNew) {
   stabilizer_global global = empty_clip(1, 100);
-  add_still(global, 0, 0, 100, {0, 0}, shifted);
+  add_moving(global, 0, 0, 100);
   const factorization_window window = overlapping(global);
   global.output_at(60, 0).status = -1;  // held by the old solution alone
   const displacement_lists lists = blended_displacements(global, {window}, {});
+  const auto shift = [&](int f) { return lists[f][0].targetX - lists[f][0].sourceX; };
   for (const auto& [f, t] : {std::pair(40, .967742), {55, .483871}, {69, .032258}}) {
-    EXPECT_NEAR(lists[f][0].targetX, 10 + 8 * t, 1e-5);
+    EXPECT_NEAR(shift(f), 10 + 8 * t, 1e-5);
     EXPECT_EQ(lists[f][0].weight, .5);  // as its span is as long as a flank
   }
-  EXPECT_EQ(lists[39][0].targetX, 10);
-  EXPECT_EQ(lists[70][0].targetX, 10);
-  EXPECT_EQ(lists[60][0].targetX, 18);
+  EXPECT_EQ(shift(39), 10);
+  EXPECT_EQ(shift(70), 10);
+  EXPECT_EQ(shift(60), 18);
   EXPECT_NEAR(lists[60][0].weight, .5 * 10 / 31, 1e-12);
 }
 

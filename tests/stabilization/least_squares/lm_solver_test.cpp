@@ -184,24 +184,6 @@ TEST(LmSolver, WhatEndsARunAndWhere) {
   EXPECT_TRUE(none.calls.empty());
 }
 
-// From 1e-3 the first step is bound to delta = 100 |diag x|, |diag p| within a tenth of it. 1000 is
-// ten thousand times further than that, and each kept promise doubles the region: 1 + 2 + 4 + ...
-// comes there in 14 steps.
-TEST(LmSolver, DampedStepsKeepToATrustRegionThatDoubles) {
-  dense_problem p = {[](const vector& x) {
-    return equations{{2 * (x[0] - 1000), 2, 0}, {3 * (x[1] - 1000), 0, 3}};
-  }};
-  const run first = run({1e-3, 1e-3}).of(p, 1);
-  const double delta = 100 * std::hypot(2e-3, 3e-3);
-  const double taken = std::hypot(2 * (first.x[0] - 1e-3), 3 * (first.x[1] - 1e-3));
-  EXPECT_NEAR(taken, delta, 0.1 * delta);
-  EXPECT_EQ(p.count("pinv_jtj_quadratic"), 1);
-  const run all = run({1e-3, 1e-3}).of(p);
-  EXPECT_NEAR(all.x[1], 1000, 1e-6);
-  EXPECT_GE(all.iter, 13);
-  EXPECT_LE(all.iter, 15);
-}
-
 TEST(LmSolver, LimitsGoByTheirComparison) {
   const double cosine = 1.0 / std::sqrt(2.0);
   for (const auto& [limit, steps] : {std::pair(cosine, 1), {std::nextafter(cosine, 1.0), 0}}) {

@@ -169,7 +169,7 @@ class bundle : public sparse_bundle_adjuster3 {
  public:
   // Each point lives on `span` cameras, the first one moving on from point to point; the last third
   // of the points is the second group.
-  bundle(int cameras, int points, int span, bool first_fixed) : first_fixed_(first_fixed) {
+  bundle(int cameras, int points, int span, bool first_fixed) {
     std::mt19937 random(5);
     std::uniform_real_distribution<double> unit(0, 1);
     cameras_.resize(cameras);
@@ -189,12 +189,9 @@ class bundle : public sparse_bundle_adjuster3 {
     vector x(unknown_count());
     gather(x.data());
     const vector motion = generic_motion(static_cast<int>(cameras_.size()));
-    std::copy(motion.begin() + (first_fixed_ ? 4 : 0), motion.end(), x.begin());
+    std::copy(motion.begin() + (cameras_[0].variable ? 0 : 4), motion.end(), x.begin());
     return x;
   }
-
- private:
-  const bool first_fixed_;
 };
 
 TEST(SparseBundleAdjuster, OperationsAgreeWithDifferencesAndTheDenseMatrix) {
