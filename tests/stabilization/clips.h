@@ -91,28 +91,6 @@ inline factorization_window window_over(std::uint64_t first, std::uint64_t end) 
   return window;
 }
 
-// Puts samples into the slot over [first, end); at(frame) tells where the track is.
-template <class At>
-void put_track(stabilizer_global& global, std::size_t slot, int first, int end, At at) {
-  for (int f = first; f < end; ++f) {
-    const point2 p = at(f);
-    global.input[f * global.feature_count + slot] = {
-        static_cast<float>(p.x), static_cast<float>(p.y), f == first ? f + 1 : 0, 1};
-  }
-}
-
-// The same with its trajectory and its stabilized positions, wanted(frame, source).
-template <class At, class Wanted>
-void add_track(stabilizer_global& global, std::size_t slot, int first, int end, At at,
-               Wanted wanted) {
-  put_track(global, slot, first, end, at);
-  global.trajectories.push_back({static_cast<int>(slot), 0, first, end});
-  for (int f = first; f < end; ++f) {
-    const point2 q = wanted(f, position(global.input_at(f, slot)));
-    global.output_at(f, slot) = {static_cast<float>(q.x), static_cast<float>(q.y), f == first, 0};
-  }
-}
-
 inline void build_trajectories(stabilizer_global& global) {
   global.trajectories =
       tracking::BuildTrajectories(global.input.data(), global.feature_count, global.frame_count);
@@ -126,13 +104,16 @@ struct lives {
 // at(slot, frame) tells where the tracks are.
 template <class At>
 stabilizer_global clip_of(int frames, const std::vector<lives>& tracks, At at) {
-  std::size_t slots = 0;
+  std::size_t slots = 0, slot = 0;
   for (const lives& l : tracks) slots += l.count;
   stabilizer_global global = empty_clip(slots, frames);
-  std::size_t slot = 0;
   for (const lives& l : tracks) {
-    for (int k = 0; k < l.count; ++k, ++slot) {
-      put_track(global, slot, l.first, l.end, [&](int f) { return at(slot, f); });
+    for (const std::size_t next = slot + l.count; slot < next; ++slot) {
+      for (int f = l.first; f < l.end; ++f) {
+        const point2 p = at(slot, f);
+        global.input[f * slots + slot] = {static_cast<float>(p.x), static_cast<float>(p.y),
+                                          f == l.first ? f + 1 : 0, 1};
+      }
     }
   }
   build_trajectories(global);
@@ -262,10 +243,11 @@ inline constexpr int kWidth = 1920, kHeight = 1080;
 template <class Wanted, class At = point2 (*)(std::size_t)>
 boost::shared_ptr<stabilizer_global> still_clip(int tracks, int frames, Wanted wanted,
                                                 At at = scattered) {
-  auto global = boost::make_shared<stabilizer_global>(empty_clip(tracks, frames));
-  for (int s = 0; s < tracks; ++s) {
-    add_track(
-        *global, s, 0, frames, [&](int) { return at(s); }, wanted);
+  auto global = boost::make_shared<stabilizer_global>(
+      clip_of(frames, {{tracks, 0, frames}}, [&](std::size_t slot, int) { return at(slot); }));
+  for (int i = 0; i < tracks * frames; ++i) {
+    const point2 q = wanted(i / tracks, position(global->input[i]));
+    global->output[i] = {static_cast<float>(q.x), static_cast<float>(q.y), i < tracks, 0};
   }
   return global;
 }

@@ -198,6 +198,12 @@ TEST(LmSolver, LimitsGoByTheirComparison) {
   r.maxfev = 4;
   EXPECT_EQ(r.of(p).info, 5);
   EXPECT_EQ(r.nfev, 4);
+
+  // The first step is bound to 100 |diag x|, |diag p| within a tenth of it.
+  dense_problem bound = {straight};
+  const vector x = run({1e-4, 1e-4}).of(bound, 1).x;
+  const double delta = 100 * std::hypot(5e-4, 13e-4);
+  EXPECT_NEAR(std::hypot(5 * (x[0] - 1e-4), 13 * (x[1] - 1e-4)), delta, 0.1 * delta);
 }
 
 // The counts that MINPACK's lmder takes from the usual start and from ten times it (More,
