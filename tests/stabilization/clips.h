@@ -266,7 +266,7 @@ inline point2 on_rings(std::size_t slot) {
 // A warper with its models decided. homography_limit: what a frame's homography may be off.
 inline boost::shared_ptr<CPWarper> built(
     const boost::shared_ptr<stabilizer_global>& global, float method,
-    const std::vector<factorization_window>& windows,
+    const std::vector<factorization_window>& windows = {},
     const std::vector<transition_record>& transitions = {},
     float homography_limit = SolverParamsRecord().homography_limit) {
   const int frames = static_cast<int>(global->frame_count);
@@ -277,11 +277,6 @@ inline boost::shared_ptr<CPWarper> built(
   parameters.homography_limit = homography_limit;
   warper->buildDisplacements(global, windows, transitions, parameters, kNoProgress);
   return warper;
-}
-
-inline boost::shared_ptr<CPWarper> built(const boost::shared_ptr<stabilizer_global>& global,
-                                         float method) {
-  return built(global, method, {window_over(0, global->frame_count)});
 }
 
 inline boost::shared_ptr<CPWarper> driven(const boost::shared_ptr<stabilizer_global>& global,

@@ -158,7 +158,7 @@ TEST(CPWarperTest, AFrameWhoseTracksDisagreeBecomesASimilarityAndItsNeighboursRa
       return point2{p.x + ((p.x > 960) == (p.y > 540) ? to : -to), p.y};
     };
     const auto global = still_clip(8, 120, wanted, on_rings);
-    const auto warper = built(global, 4, {window_over(0, 120)}, {}, 1e9f);
+    const auto warper = built(global, 4, {}, {}, 1e9f);
     std::vector<double> found;
     for (const int f : {50, 51, 36, 35, 65, 20, 19}) found.push_back(warper->modelScore(f));
     return found;
