@@ -2,20 +2,21 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <boost/make_shared.hpp>
 #include <cmath>
 #include <cstddef>
-#include <random>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/tessel/debug.h"
-#include "stabilization/displacements.h"
-#include "stabilization/models/matrix3.h"
-#include "stabilization/solve_records.h"
-#include "stabilization/stabilizer_global.h"
-#include "stabilization/warp/var_vector.h"
+#include "stabilization/models/similarity.h"
+#include "stabilization/stabilizer_main.h"
+#include "stabilization/warp/cp_warper.h"
+#include "synthetic/track_world.h"
 
-// Displacements and clips made by hand.
+// Displacements and clips made by hand, clips through the whole solve, and clips for the warper.
 namespace marrow::stabilization {
 
 inline const progress_functor kNoProgress = [] {};
@@ -90,40 +91,33 @@ inline factorization_window window_over(std::uint64_t first, std::uint64_t end) 
   return window;
 }
 
-// Puts samples into the slot over [first, end); at(frame) tells where the track is.
-template <class At>
-void put_track(stabilizer_global& global, std::size_t slot, int first, int end, At at) {
-  for (int f = first; f < end; ++f) {
-    const point2 p = at(f);
-    global.input[f * global.feature_count + slot] = {
-        static_cast<float>(p.x), static_cast<float>(p.y), f == first ? f + 1 : 0, 1};
-  }
-}
-
-// The same with its trajectory and its stabilized positions, wanted(frame, source).
-template <class At, class Wanted>
-void add_track(stabilizer_global& global, std::size_t slot, int first, int end, At at,
-               Wanted wanted) {
-  put_track(global, slot, first, end, at);
-  global.trajectories.push_back({static_cast<int>(slot), 0, first, end});
-  for (int f = first; f < end; ++f) {
-    const point2 q = wanted(f, position(global.input_at(f, slot)));
-    global.output_at(f, slot) = {static_cast<float>(q.x), static_cast<float>(q.y), f == first, 0};
-  }
-}
-
-// Of a track that stands still.
-template <class Wanted>
-void add_still(stabilizer_global& global, std::size_t slot, int first, int end, point2 p,
-               Wanted wanted) {
-  add_track(
-      global, slot, first, end, [p](int) { return p; },
-      [&](int f, point2 q) { return wanted(f, q); });
-}
-
 inline void build_trajectories(stabilizer_global& global) {
   global.trajectories =
       tracking::BuildTrajectories(global.input.data(), global.feature_count, global.frame_count);
+}
+
+// Tracks over [first, end), each in a slot of its own.
+struct lives {
+  int count, first, end;
+};
+
+// at(slot, frame) tells where the tracks are.
+template <class At>
+stabilizer_global clip_of(int frames, const std::vector<lives>& tracks, At at) {
+  std::size_t slots = 0, slot = 0;
+  for (const lives& l : tracks) slots += l.count;
+  stabilizer_global global = empty_clip(slots, frames);
+  for (const lives& l : tracks) {
+    for (const std::size_t next = slot + l.count; slot < next; ++slot) {
+      for (int f = l.first; f < l.end; ++f) {
+        const point2 p = at(slot, f);
+        global.input[f * slots + slot] = {static_cast<float>(p.x), static_cast<float>(p.y),
+                                          f == l.first ? f + 1 : 0, 1};
+      }
+    }
+  }
+  build_trajectories(global);
+  return global;
 }
 
 // "first end;" of each.
@@ -170,29 +164,141 @@ inline point2 shaken(point2 p, int f) {
           p.y + roll * p.x + 6 * std::cos(2.9 * f)};
 }
 
-// The second difference of a slot about frame f, in pixels; NaN where it lacks a sample.
-inline double bend(const stabilizer_global& global, const std::vector<track_sample>& rows,
-                   std::size_t slot, std::size_t f) {
-  if (f == 0 || f + 1 >= global.frame_count) return NAN;
-  const track_sample* at = &rows[f * global.feature_count + slot];
-  const track_sample &a = at[-static_cast<std::ptrdiff_t>(global.feature_count)], &b = at[0],
-                     &c = at[global.feature_count];
-  if (a.status < 0 || b.status != 0 || c.status != 0) return NAN;
-  return std::hypot(double{a.x} - 2.0 * b.x + c.x, double{a.y} - 2.0 * b.y + c.y);
+inline stabilizer_global shaken_clip(int frames, const std::vector<lives>& tracks) {
+  return clip_of(frames, tracks, [](std::size_t s, int f) { return shaken(scattered(s), f); });
 }
 
-// Root mean square of the second differences about frames [first, end); NaN where there are none.
-inline double roughness(const stabilizer_global& global, const std::vector<track_sample>& rows,
-                        std::size_t slot, int first, int end) {
-  double sum = 0;
-  int count = 0;
-  for (int f = first; f < end; ++f) {
-    const double d = bend(global, rows, slot, static_cast<std::size_t>(f));
-    if (std::isnan(d)) continue;
-    sum += d * d;
-    ++count;
+inline SolverParamsRecord params_1080p() {
+  SolverParamsRecord parameters;
+  parameters.reconstruction_error_threshold = 0.0045 * 1920;
+  parameters.reconstruction_error_third = parameters.reconstruction_error_threshold / 3;
+  return parameters;
+}
+
+inline synthetic::track_world_options world_of(int frames, int slots, double mean_life = 60) {
+  synthetic::track_world_options options;
+  options.frame_count = frames;
+  options.slots = slots;
+  options.mean_life = mean_life;
+  return options;
+}
+
+inline stabilizer_global clip_of(const synthetic::track_world_options& options) {
+  stabilizer_global global = *make_track_world(options).global;
+  build_trajectories(global);
+  return global;
+}
+
+struct solved_clip {
+  stabilizer_global global;
+  std::vector<transition_record> transitions;
+  std::vector<factorization_window> windows;
+  int result = 0;
+  std::string log;
+};
+
+inline solved_clip solve(stabilizer_global global, const SolverParamsRecord& parameters,
+                         const progress_functor& progress = kNoProgress) {
+  solved_clip clip;
+  clip.global = std::move(global);
+  captured_log log;
+  clip.result = stabilizer_main(clip.global, parameters, clip.transitions, clip.windows, 1920, 1080,
+                                progress);
+  clip.log = log.text;
+  return clip;
+}
+
+// Median over the tracks of their second difference about frame f, in pixels; NaN without tracks.
+inline double median_bend(const solved_clip& clip, const std::vector<track_sample>& rows,
+                          std::size_t f) {
+  const std::size_t columns = clip.global.feature_count;
+  std::vector<double> bends;
+  for (std::size_t i = f * columns; i < (f + 1) * columns; ++i) {
+    const track_sample &a = rows[i - columns], &b = rows[i], &c = rows[i + columns];
+    if (a.status < 0 || b.status != 0 || c.status != 0) continue;
+    bends.push_back(std::hypot(double{a.x} - 2.0 * b.x + c.x, double{a.y} - 2.0 * b.y + c.y));
   }
-  return std::sqrt(sum / count);
+  if (bends.empty()) return NAN;
+  const auto middle = bends.begin() + static_cast<std::ptrdiff_t>(bends.size() / 2);
+  std::ranges::nth_element(bends, middle);
+  return *middle;
+}
+
+// The positions that the warp of each frame goes by: windows blended where they overlap.
+inline std::vector<track_sample> blended_output(const solved_clip& clip) {
+  std::vector<track_sample> rows(clip.global.output.size(), {0, 0, -1, 0});
+  const displacement_lists lists = blended_displacements(clip.global, clip.windows, params_1080p());
+  for (std::size_t f = 0; f < lists.size(); ++f) {
+    for (const Displacement& d : lists[f]) {
+      rows[f * clip.global.feature_count + static_cast<std::size_t>(d.track->feature)] = {
+          static_cast<float>(d.targetX), static_cast<float>(d.targetY), d.prevIndex < 0, 0};
+    }
+  }
+  return rows;
+}
+
+inline constexpr int kWidth = 1920, kHeight = 1080;
+
+// Tracks that stand still all the time, at(slot) each, and want to be at wanted(frame, source).
+template <class Wanted, class At = point2 (*)(std::size_t)>
+boost::shared_ptr<stabilizer_global> still_clip(int tracks, int frames, Wanted wanted,
+                                                At at = scattered) {
+  auto global = boost::make_shared<stabilizer_global>(
+      clip_of(frames, {{tracks, 0, frames}}, [&](std::size_t slot, int) { return at(slot); }));
+  for (int i = 0; i < tracks * frames; ++i) {
+    const point2 q = wanted(i / tracks, position(global->input[i]));
+    global->output[i] = {static_cast<float>(q.x), static_cast<float>(q.y), i < tracks, 0};
+  }
+  return global;
+}
+
+// What still_clip's tracks want under m.
+inline auto under(const matrix3& m) {
+  return [m](int, point2 p) { return transform(m, p); };
+}
+
+// Two rings of four corners about the frame's middle, 400 and 200 pixels to each side.
+inline point2 on_rings(std::size_t slot) {
+  const double ring = slot < 4 ? 400 : 200;
+  return {960 + (slot & 1 ? ring : -ring), 540 + (slot & 2 ? ring : -ring)};
+}
+
+// A warper with its models decided. homography_limit: what a frame's homography may be off.
+inline boost::shared_ptr<CPWarper> built(
+    const boost::shared_ptr<stabilizer_global>& global, float method,
+    const std::vector<factorization_window>& windows = {},
+    const std::vector<transition_record>& transitions = {},
+    float homography_limit = SolverParamsRecord().homography_limit) {
+  const int frames = static_cast<int>(global->frame_count);
+  auto warper = boost::make_shared<CPWarper>(frames, kWidth, kHeight);
+  SolverParamsRecord parameters;
+  parameters.method_level = method;
+  parameters.track_fade_minimum = 0;
+  parameters.homography_limit = homography_limit;
+  warper->buildDisplacements(global, windows, transitions, parameters, kNoProgress);
+  return warper;
+}
+
+inline boost::shared_ptr<CPWarper> driven(const boost::shared_ptr<stabilizer_global>& global,
+                                          float method) {
+  auto warper = built(global, method);
+  warper->drive(kNoProgress);
+  return warper;
+}
+
+// Largest distance, in pixels, of a frame's vertices from the rest grid under m.
+inline double distance_from(const CPWarper& warper, int frame, const matrix3& m) {
+  const VarVector& grid = *warper.frameWarp(frame);
+  double largest = 0;
+  for (int r = 0; r < grid.rows; ++r) {
+    for (int c = 0; c < grid.cols; ++c) {
+      const point2 p = transform(m, {c * warper.cellWidth(), r * warper.cellHeight()});
+      const point2 v = grid.vertex(c, r);
+      const double d = std::hypot(v.x - p.x, v.y - p.y);
+      if (!(d <= largest)) largest = d;
+    }
+  }
+  return largest;
 }
 
 }  // namespace marrow::stabilization

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <cmath>
 #include <cstddef>
 #include <utility>
 #include <vector>
@@ -26,6 +28,13 @@ inline std::vector<double> minimum_norm(std::vector<double> matrix, std::vector<
   return right;
 }
 
+// By their absolute values.
+inline double largest_of(const std::vector<double>& values) {
+  double largest = 0;
+  for (const double v : values) largest = std::max(largest, std::fabs(v));
+  return largest;
+}
+
 // A problem as it is stated: one weighted equation after the other, summed into normal equations.
 class dense_reference {
  public:
@@ -38,7 +47,9 @@ class dense_reference {
       right[i] += weight * ci * target;
     }
   }
-  std::vector<double> solve() const { return minimum_norm(matrix, right); }
+  std::vector<double> solve(std::size_t* rank = nullptr) const {
+    return minimum_norm(matrix, right, rank);
+  }
 
   std::vector<double> matrix;  // symmetric
   std::vector<double> right;

@@ -35,12 +35,14 @@ TEST(FadeWeight, TracksRiseAndFallUnlessTheClipCutsThem) {
   EXPECT_EQ(fade_weight({7, false, false}, 3, 0), 1.0);  // no flanks
 }
 
-const auto shifted = [](int, point2 p) { return point2{p.x + 10, p.y - 5}; };
-
-// Of a slot: 100 pixels from its neighbours, moving by a pixel a frame.
-void add_moving(stabilizer_global& global, int slot, int first, int last) {
-  const auto at = [slot](int f) { return point2{100.0 * slot + f, 2.0 * f}; };
-  add_track(global, slot, first, last, at, shifted);
+// Tracks 100 pixels from each other that move by a pixel a frame, stabilized 10 to the right.
+stabilizer_global moving_clip(int frames, const std::vector<lives>& tracks) {
+  stabilizer_global global = clip_of(frames, tracks, [](std::size_t slot, int f) {
+    return point2{100.0 * slot + f, 2.0 * f};
+  });
+  global.output = global.input;
+  for (track_sample& sample : global.output) sample.x += 10;
+  return global;
 }
 
 // Each track has a record, linked to its neighbours and off its source by shift(frame), on exactly
@@ -69,16 +71,18 @@ void expect_lists(
 }
 
 TEST(BlendedDisplacementsTest, LinksFollowATrackThroughListsOfDifferentLength) {
-  const int lives[][2] = {{0, 8}, {0, 20}, {6, 20}, {9, 13}, {10, 15}};  // the fourth is too short
-  stabilizer_global global = empty_clip(5, 20);
-  for (int s = 0; s < 5; ++s) add_moving(global, s, lives[s][0], lives[s][1]);
-  expect_lists(blended_displacements(global, {}, {}), 5,
-               [&](int f, int s) { return s != 3 && f >= lives[s][0] && f < lives[s][1]; });
+  const std::vector<lives> tracks = {// the fourth is too short
+                                     {1, 0, 8},
+                                     {1, 0, 20},
+                                     {1, 6, 20},
+                                     {1, 9, 13},
+                                     {1, 10, 15}};
+  expect_lists(blended_displacements(moving_clip(20, tracks), {}, {}), 5,
+               [&](int f, int s) { return s != 3 && f >= tracks[s].first && f < tracks[s].end; });
 }
 
 TEST(BlendedDisplacementsTest, TracksAreCutToTheirStabilizedSamplesAndFadeFromTheCut) {
-  stabilizer_global global = empty_clip(1, 100);
-  add_moving(global, 0, 10, 90);
+  stabilizer_global global = moving_clip(100, {{1, 10, 90}});
   for (const int f : {10, 11, 40}) global.output_at(f, 0).status = -1;
   const displacement_lists lists = blended_displacements(global, {}, {});
   expect_lists(lists, 1, [](int f, int) { return f >= 12 && f < 40; });
@@ -97,25 +101,23 @@ factorization_window overlapping(const stabilizer_global& global) {
 }
 
 TEST(BlendedDisplacementsTest, AWindowsStartMovesFromTheOldSolutionToTheNew) {
-  stabilizer_global global = empty_clip(1, 100);
-  add_still(global, 0, 0, 100, {0, 0}, shifted);
+  stabilizer_global global = moving_clip(100, {{1, 0, 100}});
   const factorization_window window = overlapping(global);
   global.output_at(60, 0).status = -1;  // held by the old solution alone
   const displacement_lists lists = blended_displacements(global, {window}, {});
+  const auto shift = [&](int f) { return lists[f][0].targetX - lists[f][0].sourceX; };
   for (const auto& [f, t] : {std::pair(40, .967742), {55, .483871}, {69, .032258}}) {
-    EXPECT_NEAR(lists[f][0].targetX, 10 + 8 * t, 1e-5);
+    EXPECT_NEAR(shift(f), 10 + 8 * t, 1e-5);
     EXPECT_EQ(lists[f][0].weight, .5);  // as its span is as long as a flank
   }
-  EXPECT_EQ(lists[39][0].targetX, 10);
-  EXPECT_EQ(lists[70][0].targetX, 10);
-  EXPECT_EQ(lists[60][0].targetX, 18);
+  EXPECT_EQ(shift(39), 10);
+  EXPECT_EQ(shift(70), 10);
+  EXPECT_EQ(shift(60), 18);
   EXPECT_NEAR(lists[60][0].weight, .5 * 10 / 31, 1e-12);
 }
 
 TEST(BlendedDisplacementsTest, InsideAnOverlapTheWindowsTableSaysWhoLives) {
-  stabilizer_global global = empty_clip(2, 100);
-  add_moving(global, 0, 0, 100);
-  add_moving(global, 1, 50, 100);
+  const stabilizer_global global = moving_clip(100, {{1, 0, 100}, {1, 50, 100}});
   factorization_window window = overlapping(global);
   window.overlap_rows[20 * 2 + 0].status = -1;  // frame 60 of the first track
   window.overlap_rows[10 * 2 + 1].status = -1;  // the second one's first frame
@@ -124,8 +126,7 @@ TEST(BlendedDisplacementsTest, InsideAnOverlapTheWindowsTableSaysWhoLives) {
 }
 
 TEST(MemberDisplacementsTest, TracksRunAsLongAsTheirWindowsListThem) {
-  stabilizer_global global = empty_clip(3, 120);
-  for (int s = 0; s < 3; ++s) add_moving(global, s, 0, 120);
+  stabilizer_global global = moving_clip(120, {{3, 0, 120}});
   for (track_sample& sample : global.output) sample.status = -1;  // nothing solved yet
   std::vector<factorization_window> windows = {window_over(10, 60), window_over(50, 100)};
   for (factorization_window& window : windows) window.trajectory_flags = {1, 1};
@@ -135,8 +136,7 @@ TEST(MemberDisplacementsTest, TracksRunAsLongAsTheirWindowsListThem) {
 }
 
 TEST(RefreshTargetsTest, DroppedRecordsLeaveAllLinksRight) {
-  stabilizer_global global = empty_clip(4, 30);
-  for (int s = 0; s < 4; ++s) add_moving(global, s, 0, 30);
+  stabilizer_global global = moving_clip(30, {{4, 0, 30}});
   displacement_lists lists = blended_displacements(global, {}, {});
   for (track_sample& sample : global.output) sample.x += 1;
   // Beside the range, on its first frame, inside it, and on its last.

@@ -4,58 +4,48 @@
 
 #include <cmath>
 #include <limits>
-#include <numbers>
 #include <string>
 #include <utility>
 #include <vector>
 
-#include "stabilization/warp/cp_warper.h"
-#include "tests/stabilization/solve_clips.h"
+#include "tests/stabilization/clips.h"
+#include "tests/stabilization/dense_reference.h"
 
 // Whole clips, with known motion or with little to go by.
 namespace marrow::stabilization {
 namespace {
 
-// A scene that only shifts, on tracks that all span the clip: the filter's gain can be read off.
-TEST(StabilizerMain, SinusoidsComeOutWithTheFiltersGain) {
-  // 1 / (1 + lambda^2 (2 sin(pi / T))^4). At lambda 200 half the power is left at T = 89.
-  const struct {
-    double lambda, period, gain;
-  } cases[] = {{200, 200, .9625}, {200, 89, .5018}, {200, 20, .0026}, {.4, 4, .6098}};
-  for (const auto& e : cases) {
-    const double omega = 2 * std::numbers::pi / e.period;
+// Tracks that all span the clip weigh the same on each frame: whatever the rank, each comes out as
+// if it were smoothed by itself.
+TEST(StabilizerMain, WholeTracksComeOutAsADenseFilterOfEach) {
+  constexpr std::size_t kFrames = 150, kTrack = 7;
+  for (const double lambda : {.4, 20., 200.}) {
     SolverParamsRecord parameters = params_1080p();
-    parameters.smoothness_lambda = e.lambda;
-    stabilizer_global global = empty_clip(80, 330);
-    for (std::size_t s = 0; s < 80; ++s) {
-      const point2 p = scattered(s);
-      put_track(global, s, 0, 330, [&](int f) {
-        return point2{p.x + 30 * std::sin(omega * f), p.y + 20 * std::cos(omega * f)};
-      });
+    parameters.smoothness_lambda = lambda;
+    const solved_clip clip = solve(shaken_clip(kFrames, {{80, 0, kFrames}}), parameters);
+    ASSERT_EQ(spans_of(clip.windows), "0 150;");
+    for (const auto axis : {&track_sample::x, &track_sample::y}) {
+      dense_reference filter(kFrames);
+      for (std::size_t f = 0; f < kFrames; ++f) {
+        filter.add(1, {{f, 1}}, clip.global.input_at(f, kTrack).*axis);
+        if (f == 0 || f + 1 == kFrames) continue;
+        filter.add(lambda * lambda, {{f - 1, 1}, {f, -2}, {f + 1, 1}}, 0);
+      }
+      const std::vector<double> expected = filter.solve();
+      for (std::size_t f = 0; f < kFrames; ++f) {
+        EXPECT_NEAR(clip.global.output_at(f, kTrack).*axis, expected[f], 2e-3)
+            << "lambda " << lambda << ", frame " << f;
+      }
     }
-    const solved_clip clip = solve(std::move(global), parameters);
-    ASSERT_EQ(spans_of(clip.windows), "0 330;");
-    // Over half a period, away from the clip's ends, whose effect falls by e every 20 frames.
-    double in = 0, out = 0;
-    for (int f = 165 - static_cast<int>(e.period / 4); f < 165 + e.period / 4; ++f) {
-      const double wave[2] = {std::sin(omega * f) / 30, std::cos(omega * f) / 20};
-      const point2 rest = scattered(0);
-      const point2 a = position(clip.global.input_at(f, 0));
-      const point2 b = position(clip.global.output_at(f, 0));
-      in += wave[0] * (a.x - rest.x) + wave[1] * (a.y - rest.y);
-      out += wave[0] * (b.x - rest.x) + wave[1] * (b.y - rest.y);
-    }
-    EXPECT_NEAR(out / in, e.gain, 0.02 * e.gain + 1e-4) << e.lambda << ", period " << e.period;
   }
 }
 
 // Some tracks jump by 40 pixels in mid-life.
-TEST(StabilizerMain, ALivelySceneComesOutSmoothWithoutTheTracksThatJump) {
+TEST(StabilizerMain, TracksThatJumpTakeNoPart) {
   stabilizer_global global = clip_of(world_of(300, 500));
   const auto jumps = [](const Trajectory& t) {
     return t.feature % 10 == 0 && t.last - t.first > 80;
   };
-  build_trajectories(global);
   for (const Trajectory& t : global.trajectories) {
     for (int f = (t.first + t.last) / 2; jumps(t) && f < t.last; ++f) {
       global.input[f * global.feature_count + t.feature].x += 40;
@@ -65,22 +55,17 @@ TEST(StabilizerMain, ALivelySceneComesOutSmoothWithoutTheTracksThatJump) {
   ASSERT_EQ(spans_of(clip.windows), "0 300;");
   const factorization_window& window = clip.windows.front();
   EXPECT_EQ(window.rank, 9u);
-  std::vector<double> rough_in, rough_out;
-  std::size_t jumped = 0, sound = 0;
+  std::size_t jumped = 0, sound = 0, taken = 0;
   for (std::size_t t = 0; t < clip.global.trajectories.size(); ++t) {
     const Trajectory& track = clip.global.trajectories[t];
+    const bool is_sound = track.last - track.first >= 10 && !jumps(track);
     jumped += jumps(track);
-    sound += track.last - track.first >= 10 && !jumps(track);
-    if (!window.takes_part(t)) continue;
-    EXPECT_TRUE(track.last - track.first >= 10 && !jumps(track));
-    const int begin = track.first + 1, end = track.last - 1;
-    rough_in.push_back(roughness(clip.global, clip.global.input, track.feature, begin, end));
-    rough_out.push_back(roughness(clip.global, clip.global.output, track.feature, begin, end));
+    sound += is_sound;
+    taken += window.takes_part(t);
+    EXPECT_TRUE(is_sound || !window.takes_part(t));
   }
   EXPECT_GE(jumped, 10u);
-  EXPECT_GT(rough_in.size(), sound * 95 / 100);
-  EXPECT_GT(median(rough_in), 5.0);
-  EXPECT_LT(median(rough_out), median(rough_in) / 100);
+  EXPECT_GT(taken, sound * 95 / 100);
 }
 
 // The blend over the overlap hides the step from one solution to the next.
@@ -133,31 +118,9 @@ TEST(StabilizerMain, ProgressMayEndItAnywhere) {
   }
 }
 
-// Points of a shaken camera in slots [slot_begin, slots).
-stabilizer_global shaken_clip(int frames, int slots, int end, int slot_begin = 0) {
-  stabilizer_global global = empty_clip(slots, frames);
-  for (int s = slot_begin; s < slots; ++s) {
-    put_track(global, s, 0, end, [s](int f) { return shaken(scattered(s), f); });
-  }
-  return global;
-}
-
 // All tracks in one place: a single signal, and every other coefficient a multiple of its own.
 stabilizer_global tracks_at(point2 p) {
-  stabilizer_global global = empty_clip(50, 100);
-  for (int s = 0; s < 50; ++s) {
-    put_track(global, s, 0, 100, [p](int) { return p; });
-  }
-  return global;
-}
-
-stabilizer_global scene_cut() {
-  stabilizer_global global = empty_clip(200, 300);
-  for (std::size_t s = 0; s < 400; ++s) {
-    const int first = s < 200 ? 0 : 150;
-    put_track(global, s % 200, first, first + 150, [s](int f) { return shaken(scattered(s), f); });
-  }
-  return global;
+  return clip_of(100, {{50, 0, 100}}, [p](std::size_t, int) { return p; });
 }
 
 stabilizer_global scene(synthetic::track_scene kind) {
@@ -200,19 +163,21 @@ TEST(StabilizerMain, EveryClipComesOutCovered) {
                {"similarities alone", scene(similarity), 1, "", "0 120;", "", 0.3},
                {"noise alone", scene(still), 1, "", "0 120;", "", 0.3},
                // Fewer frames than the rank; tracks under five frames do not count.
-               {"four frames", shaken_clip(4, 60, 4), 1, "", "", "unsolved 0 4;", kAny},
-               {"five frames", shaken_clip(5, 60, 5), 1, "", "", "solved 0 5;", 3},
+               {"four frames", shaken_clip(4, {{60, 0, 4}}), 1, "", "", "unsolved 0 4;", kAny},
+               {"five frames", shaken_clip(5, {{60, 0, 5}}), 1, "", "", "solved 0 5;", 3},
                // Tracks too few for the rank, by the table or by the scan.
-               {"one track", shaken_clip(120, 1, 120), 1, "", "", "unsolved 0 120;", kAny},
-               {"four of eight slots", shaken_clip(120, 8, 120, 4), 1, "", "", "solved 0 120;", 3},
+               {"one track", shaken_clip(120, {{1, 0, 120}}), 1, "", "", "unsolved 0 120;", kAny},
+               {"four of eight slots", shaken_clip(120, {{4, 0, 0}, {4, 0, 120}}), 1, "", "",
+                "solved 0 120;", 3},
                {"too few complete", clip_of(world_of(200, 20)), 1, "", "", "solved 0 200;", kAny},
                {"no tracks on one frame", empty_clip(100, 1), 1, "", "", "unsolved 0 1;", kAny},
                // 100 tracks fade by 0.01 a frame each, so they hold 7.5 up to frame 112; a window
                // of 113 frames at most ends at 110, as it grows from 40 by fives.
-               {"all die at once", shaken_clip(200, 100, 120), 1, "", "0 110;",
+               {"all die at once", shaken_clip(200, {{100, 0, 120}}), 1, "", "0 110;",
                 "solved 110 120;unsolved 120 200;", 0.3},
                // 200 tracks hold 7.5 up to frame 146 and from 153 on.
-               {"scene cut", scene_cut(), 1, "", "0 145;153 300;", "solved 145 163;", 0.3},
+               {"scene cut", shaken_clip(300, {{200, 0, 150}, {200, 150, 300}}), 1, "",
+                "0 145;153 300;", "solved 145 163;", 0.3},
                // 300 tracks hold it up to frame 137 and from 162 on. In a transition they keep
                // their noise of 0.1 pixels, which bends them by 0.3.
                {"hole", hole_in_the_middle(), 1, "", "0 135;162 300;",

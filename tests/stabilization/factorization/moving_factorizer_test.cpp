@@ -7,30 +7,12 @@
 #include <vector>
 
 #include "stabilization/factorization/window_filters.h"
-#include "synthetic/track_world.h"
 #include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
 
-using lives = std::vector<std::pair<int, int>>;
-
 constexpr double kCenterX = 960, kCenterY = 540;
-
-lives whole_clip(int count, int frames) {
-  return lives(count, {0, frames});
-}
-
-// Tracks of rank 4, each in a slot of its own.
-stabilizer_global clip_of(int frames, const lives& tracks) {
-  stabilizer_global global = empty_clip(tracks.size(), frames);
-  for (std::size_t s = 0; s < tracks.size(); ++s) {
-    put_track(global, s, tracks[s].first, tracks[s].second,
-              [s](int f) { return shaken(scattered(s), f); });
-  }
-  build_trajectories(global);
-  return global;
-}
 
 struct factorization {
   moving_factorizer factorizer;
@@ -59,13 +41,9 @@ struct factorization {
 // 40^2 a sample are left by the first window, by the frames that it moves over, and by two tracks
 // that are complete from the second position on.
 TEST(MovingFactorizerTest, WhatLiesBeyondTheRankIsLeft) {
-  stabilizer_global global = empty_clip(4, 28);
-  for (int s = 0; s < 4; ++s) {
-    put_track(global, s, s < 2 ? 0 : 4, 28, [](int f) {
-      return point2{kCenterX + 300, kCenterY + (f % 2 ? 40 : -40)};
-    });
-  }
-  build_trajectories(global);
+  stabilizer_global global = clip_of(28, {{2, 0, 28}, {2, 4, 28}}, [](std::size_t, int f) {
+    return point2{kCenterX + 300, kCenterY + (f % 2 ? 40 : -40)};
+  });
   const factorization found(global, 1, 0, 300, 20, 4);
   ASSERT_EQ(found.end(), 28);
   ASSERT_EQ(found.factorizer.residuals().size(), 3u);
@@ -82,15 +60,14 @@ TEST(MovingFactorizerTest, WhatLiesBeyondTheRankIsLeft) {
 }
 
 TEST(MovingFactorizerTest, MovingKeepsExactDataExactWhileTracksComeAndGo) {
-  lives tracks;
+  std::vector<lives> tracks;
   for (int s = 0; s < 60; ++s) {
     const int first = std::max(0, (s * 7) % 260 - 30);
-    tracks.push_back({first, std::min(247, first + 60 + (s * 13) % 90)});
+    tracks.push_back({1, first, std::min(247, first + 60 + (s * 13) % 90)});
   }
-  for (int s = 0; s < 12; ++s) {  // under the rank, at it
-    tracks.push_back({100 + s, 103 + s + s % 2});
-  }
-  stabilizer_global global = clip_of(247, tracks);
+  // Under the rank, and at it.
+  for (int s = 0; s < 12; ++s) tracks.push_back({1, 100 + s, 103 + s + s % 2});
+  stabilizer_global global = shaken_clip(247, tracks);
   for (const auto& [start, limit, end] : {std::tuple(0, 300, 247), {100, 94, 190}}) {
     const factorization found(global, 4, start, limit);
     EXPECT_EQ(found.window.first, static_cast<std::uint64_t>(start));
@@ -113,21 +90,21 @@ TEST(MovingFactorizerTest, WhereAWindowEnds) {
   const struct {
     int first, limit, step, end;
   } cases[] = {{0, 300, 7, 200}, {10, 94, 5, 100}, {0, 33, 5, 33}, {180, 300, 5, 200}};
-  const stabilizer_global steady = clip_of(200, whole_clip(10, 200));
+  const stabilizer_global steady = shaken_clip(200, {{10, 0, 200}});
   for (const auto& e : cases) {
     EXPECT_EQ(factorization(steady, 4, e.first, e.limit, 40, e.step).end(), e.end)
         << e.first << " " << e.limit;
   }
   // One track is too few for a rank of 4 behind frame 101.
-  const stabilizer_global fading = clip_of(200, {{0, 200}, {0, 101}, {0, 101}, {0, 101}});
+  const stabilizer_global fading = shaken_clip(200, {{1, 0, 200}, {3, 0, 101}});
   EXPECT_EQ(factorization(fading, 4, 0, 300).end(), 100);
   EXPECT_EQ(factorization(fading, 4, 150, 300).end(), 150);  // empty
-  const stabilizer_global enough = clip_of(200, {{0, 200}, {0, 200}, {0, 101}});
+  const stabilizer_global enough = shaken_clip(200, {{2, 0, 200}, {1, 0, 101}});
   EXPECT_EQ(factorization(enough, 4, 0, 300).end(), 200);
 }
 
 TEST(MovingFactorizerTest, AStretchShorterThanTheRankHasNoTracks) {
-  const stabilizer_global global = clip_of(45, whole_clip(10, 45));
+  const stabilizer_global global = shaken_clip(45, {{10, 0, 45}});
   factorization found(global, 9, 0, 300);  // leaves its memory used
   factorization_window rest;
   EXPECT_EQ(found.factorizer.Factorize(global, 40, 300, 0, 0, rest, kNoProgress), 45u);
@@ -140,14 +117,11 @@ TEST(MovingFactorizerTest, AStretchShorterThanTheRankHasNoTracks) {
 }
 
 TEST(MovingFactorizerTest, RankAboveNineAndAboveTheOverlap) {
-  synthetic::track_world_options options;
-  options.frame_count = 120;
-  options.slots = 80;
+  synthetic::track_world_options options = world_of(120, 80);
   options.whole_clip = true;
   options.gain = 0.2;
   options.noise = 0;
-  stabilizer_global global = *make_track_world(options).global;
-  build_trajectories(global);
+  stabilizer_global global = clip_of(options);
   const double nine = factorization(global, 9, 0, 300).largest_error(global);
   EXPECT_LT(factorization(global, 12, 0, 300).largest_error(global), 0.7 * nine);
   // 10 frames shared, 12 signals: minimum-norm fits.

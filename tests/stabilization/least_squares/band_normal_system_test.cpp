@@ -89,7 +89,6 @@ TEST(BandNormalSystem, LargeSingularSystemIsSolvedInItsRange) {
   vector b(n);
   const auto step = [](std::size_t i) { return std::sin(0.1 * static_cast<double>(i)); };
   for (std::size_t i = 0; i + 1 < n; ++i) {
-    if (i == n / 2) continue;
     system.at(i, i) += 1;
     system.at(i + 1, i + 1) += 1;
     system.at(i + 1, i) -= 1;
@@ -99,10 +98,7 @@ TEST(BandNormalSystem, LargeSingularSystemIsSolvedInItsRange) {
   ASSERT_TRUE(system.factorize());
   EXPECT_EQ(system.rank(), n - 1);
   system.solve(b.data());
-  for (std::size_t i = 0; i + 1 < n; ++i) {
-    if (i == n / 2) continue;
-    EXPECT_NEAR(b[i + 1] - b[i], step(i), 1e-6) << i;
-  }
+  for (std::size_t i = 0; i + 1 < n; ++i) EXPECT_NEAR(b[i + 1] - b[i], step(i), 1e-6) << i;
 }
 
 TEST(BandNormalSystem, NonFiniteEntriesAreAFailure) {

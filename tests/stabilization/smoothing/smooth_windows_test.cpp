@@ -4,10 +4,9 @@
 
 #include <cmath>
 #include <cstddef>
-#include <utility>
 #include <vector>
 
-#include "tests/stabilization/solve_clips.h"
+#include "tests/stabilization/clips.h"
 
 // A clip in which every kind of join occurs: a transition at its start, a window behind it, a
 // transition behind the window's cleaned tail, a window behind that, a transition to the end.
@@ -27,22 +26,14 @@ point2 point_of_chain(std::size_t slot, int frame) {
     x += 9 * std::sin(1.7 * f);
     y += 7 * std::cos(1.3 * f);
   }
-  const double roll = 0.01 * std::sin(0.7 * f);
-  return {std::cos(roll) * x - std::sin(roll) * y, std::sin(roll) * x + std::cos(roll) * y};
+  return transform(similarity{1, 0.01 * std::sin(0.7 * f), 0, 0}, {x, y});
 }
 
 solved_clip solve_chain(SolverParamsRecord parameters, point2 (*point)(std::size_t, int)) {
-  std::vector<std::pair<int, int>> spans;
-  for (int i = 0; i < 18; ++i) spans.emplace_back(6, 36);
-  for (int i = 0; i < 18; ++i) spans.emplace_back(46, 76);
-  for (int i = 0; i < 6; ++i) spans.emplace_back(0, 10 + i);
-  for (int i = 0; i < 8; ++i) spans.emplace_back(22 + 2 * i, 40 + 2 * i);
-  for (int i = 0; i < 6; ++i) spans.emplace_back(64 + 2 * i, 80 + 2 * i);
-  stabilizer_global global = empty_clip(spans.size(), 90);
-  for (std::size_t slot = 0; slot < spans.size(); ++slot) {
-    put_track(global, slot, spans[slot].first, spans[slot].second,
-              [&](int f) { return point(slot, f); });
-  }
+  std::vector<lives> tracks = {{18, 6, 36}, {18, 46, 76}};
+  for (int i = 0; i < 6; ++i) tracks.push_back({1, 0, 10 + i});
+  for (int i = 0; i < 8; ++i) tracks.push_back({1, 22 + 2 * i, 40 + 2 * i});
+  for (int i = 0; i < 6; ++i) tracks.push_back({1, 64 + 2 * i, 80 + 2 * i});
   parameters.rank = 3;
   parameters.duration = 20;
   parameters.short_trajectory_duration = 5;
@@ -51,7 +42,7 @@ solved_clip solve_chain(SolverParamsRecord parameters, point2 (*point)(std::size
   parameters.conservative_factorization = false;
   parameters.factorization_window_overlap = 10;
   parameters.reconstruction_error_threshold = 1e9;  // keeps what moves by itself
-  return solve(std::move(global), parameters);
+  return solve(clip_of(90, tracks, point), parameters);
 }
 
 // The numbers come from a plain program of its own, dense and in double precision, with

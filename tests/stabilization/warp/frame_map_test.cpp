@@ -2,14 +2,14 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/stabilization/warper_clips.h"
+#include "tests/stabilization/clips.h"
 
 namespace marrow::stabilization {
 namespace {
 
 // A camera that pans by 3 px a frame and is to stand still.
 boost::shared_ptr<stabilizer_global> panning(int tracks, int frames) {
-  auto global = clip_of(tracks, frames, [](int, point2 p) { return p; });
+  auto global = still_clip(tracks, frames, under(identity3));
   for (int f = 0; f < frames; ++f) {
     for (int s = 0; s < tracks; ++s) global->input[f * tracks + s].x += 3.0f * f;
   }
@@ -46,9 +46,8 @@ TEST(FrameMapTest, SixSharedTracksMakeAnEntryAndFiveDoNot) {
   for (const int shared : {5, 6}) {
     auto global = panning(shared + 16, 6);
     for (int s = shared; s < shared + 16; ++s) {  // alive in frames 3 to 5, or 0 to 2 alone
-      const bool late = s < shared + 8;
-      (late ? global->trajectories[s].first : global->trajectories[s].last) = 3;
-      for (int f = late ? 0 : 3; f < (late ? 3 : 6); ++f) global->output_at(f, s).status = -1;
+      Trajectory& track = global->trajectories[s];
+      (s < shared + 8 ? track.first : track.last) = 3;
     }
     const auto warper = driven(global, 2);
     const struct {
@@ -66,11 +65,8 @@ TEST(FrameMapTest, SixSharedTracksMakeAnEntryAndFiveDoNot) {
 // Scores rise by 1/15 a frame from frame 0, which has no tracks: 1.67 on frame 10, 2 on frame 16.
 TEST(FrameMapTest, TheModelOfTheTargetFrameRules) {
   const matrix3 turned = similarity_matrix(1.03, .02, 12, 7);
-  auto global = clip_of(40, 20, [&](int, point2 p) { return transform(turned, p); });
-  for (int s = 0; s < 40; ++s) {
-    global->trajectories[s].first = 1;
-    global->output_at(0, s).status = -1;
-  }
+  auto global = still_clip(40, 20, under(turned));
+  for (Trajectory& t : global->trajectories) t.first = 1;
   const auto warper = driven(global, 2);
   matrix3 m;
   ASSERT_TRUE(warper->alignFrameMtoN(16, 10, m));
@@ -85,11 +81,10 @@ TEST(FrameMapTest, TheModelOfTheTargetFrameRules) {
 // 8 tracks of weight 0.06 want to move by 10 pixels and 12 of weight 0.03 to stay, so frame 5 moves
 // by 4.8 / 0.84: also for frame 1, which shares the 8 with it.
 TEST(FrameMapTest, PointsGoWhereTheStoredWarpPutsThem) {
-  auto global = boost::make_shared<stabilizer_global>(empty_clip(20, 6));
-  for (int s = 0; s < 20; ++s) {
-    add_still(*global, s, s < 8 ? 0 : 3, 6, scattered(s), [s](int, point2 p) {
-      return point2{p.x + (s < 8 ? 10 : 0), p.y};
-    });
+  const auto global = still_clip(20, 6, under(identity3));
+  for (int s = 8; s < 20; ++s) global->trajectories[s].first = 3;
+  for (int f = 0; f < 6; ++f) {
+    for (int s = 0; s < 8; ++s) global->output_at(f, s).x += 10;
   }
   matrix3 m;
   ASSERT_TRUE(driven(global, 1)->alignFrameMtoN(1, 5, m));
@@ -102,12 +97,10 @@ TEST(FrameMapTest, PointsGoWhereTheStoredWarpPutsThem) {
 TEST(FrameMapTest, AHomographyFarFromTheSimilarityFallsBackToIt) {
   for (const double off : {49.0, 51.0}) {
     const double a = off / 1502;
-    const auto global = rings_clip(2, [a](int, point2 p) {
-      return point2{(1 + a) * p.x, (1 - a) * p.y};
-    });
+    const auto global = still_clip(8, 2, under({1 + a, 0, 0, 0, 1 - a, 0, 0, 0, 1}), on_rings);
     // Of a frame's own model it decides too.
     EXPECT_EQ(built(global, 3)->modelScore(1), off < 50 ? 3 : 2);
-    const auto warper = built(global, 3, {window_over(0, 2)}, {}, 1e9f);
+    const auto warper = built(global, 3, {}, {}, 1e9f);
     warper->drive(kNoProgress);
     matrix3 m;
     ASSERT_TRUE(warper->alignFrameMtoN(0, 1, m));
@@ -119,12 +112,8 @@ TEST(FrameMapTest, AHomographyFarFromTheSimilarityFallsBackToIt) {
 TEST(FrameMapTest, AStrongElationFallsBackToTheSimilarity) {
   // Tracks near the origin, so that homography and similarity agree but for the bottom row.
   for (const double elation : {1.8e-4, 2.2e-4}) {
-    auto global = boost::make_shared<stabilizer_global>(empty_clip(100, 2));
-    for (int s = 0; s < 100; ++s) {
-      add_still(*global, s, 0, 2, {30.0 * (s % 10), 30.0 * (s / 10)}, [&](int, point2 p) {
-        return transform({1, 0, 0, 0, 1, 0, elation, 0, 1}, p);
-      });
-    }
+    const auto near_origin = [](std::size_t s) { return point2{30.0 * (s % 10), 30.0 * (s / 10)}; };
+    const auto global = still_clip(100, 2, under({1, 0, 0, 0, 1, 0, elation, 0, 1}), near_origin);
     matrix3 m;
     ASSERT_TRUE(driven(global, 3)->alignFrameMtoN(0, 1, m));
     EXPECT_NEAR(m[6], elation < 2e-4 ? elation : 0, 2e-6);
