@@ -36,15 +36,5 @@ TEST(CameraTest, BackProjectionMeetsTheSamePixelOfTheFieldOfView) {
   EXPECT_NEAR(pixel->y, 401.5, 1e-10);
 }
 
-TEST(CameraTest, SmallRotationsJoinLargeOnes) {
-  for (const double angle : {0.0, 1e-9, 0.9999e-4, 1.0001e-4, 0.01}) {
-    const rotation3 r = rotation_matrix({0, 0, angle});
-    EXPECT_NEAR(r[0], std::cos(angle), 1e-15);
-    EXPECT_NEAR(r[1], -std::sin(angle), 1e-15);
-    EXPECT_NEAR(r[3], std::sin(angle), 1e-15);
-    EXPECT_NEAR(r[8], 1.0, 1e-15);
-  }
-}
-
 }  // namespace
 }  // namespace synthetic

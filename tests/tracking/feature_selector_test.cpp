@@ -57,27 +57,23 @@ FeatureSelector Candidates(const SelectorParams& params, const Image& image) {
   return selector;
 }
 
+std::string Text(float x, float y, float score) {
+  std::ostringstream text;
+  text << x << ',' << y << ' ' << score;
+  return text.str();
+}
+
 std::vector<std::string> Texts(const FeatureSelector& selector) {
   std::vector<std::string> texts;
   for (const auto& c : selector.candidates) {
-    std::ostringstream text;
-    text << c.pixel % selector.width() << ',' << c.pixel / selector.width() << ' ' << c.score;
-    texts.push_back(text.str());
+    texts.push_back(Text(c.pixel % selector.width(), c.pixel / selector.width(), c.score));
   }
   return texts;
 }
 
-SelectorParams Small() {
-  SelectorParams params;
-  params.half_winx = params.half_winy = 2;
-  params.border = 6;
-  params.presmoothing = false;
-  return params;
-}
-
 // Image after image over the whole frame, as one would write it down.
 std::vector<FeatureSelector::Candidate> PlainCandidates(const SelectorParams& p, const Image& image,
-                                                        int* below_zero = nullptr) {
+                                                        int* below_zero) {
   const int w = image.width, h = image.height;
   const int hx = p.half_winx, hy = p.half_winy, border = p.border;
   std::vector<float> plane = image.luma;
@@ -110,8 +106,7 @@ std::vector<FeatureSelector::Candidate> PlainCandidates(const SelectorParams& p,
     }
   }
   const int mx = std::max(border, hx + 2), my = std::max(border, hy + 2);
-  std::vector<int> maxima;
-  float best = -100000.0f;
+  std::vector<FeatureSelector::Candidate> maxima;
   for (int y = my; y < h - my; ++y) {
     for (int x = mx; x < w - mx; ++x) {
       const int i = y * w + x;
@@ -119,25 +114,25 @@ std::vector<FeatureSelector::Candidate> PlainCandidates(const SelectorParams& p,
       for (const int n : {-w - 1, -w, -w + 1, -1, 1, w - 1, w, w + 1}) {
         above = above && score[i] > score[i + n];
       }
-      if (above) maxima.push_back(i), best = std::max(best, score[i]);
+      if (above) maxima.push_back({static_cast<std::uint32_t>(i), score[i]});
     }
   }
-  if (best < 0) return {};
+  if (maxima.empty()) return {};
+  std::stable_sort(maxima.begin(), maxima.end(),
+                   [](const auto& a, const auto& b) { return a.score > b.score; });
   const float area = (2 * hx + 1) * (2 * hy + 1);
-  const float limit = std::max(p.threshold * std::min(best, p.max_eig * area), p.min_eig * area);
-  std::stable_sort(maxima.begin(), maxima.end(), [&](int i, int j) { return score[i] > score[j]; });
-  std::vector<FeatureSelector::Candidate> candidates;
-  for (const int i : maxima) {
-    if (score[i] >= limit) candidates.push_back({static_cast<std::uint32_t>(i), score[i]});
-  }
-  return candidates;
+  const float limit =
+      std::max(p.threshold * std::min(maxima[0].score, p.max_eig * area), p.min_eig * area);
+  std::erase_if(maxima, [&](const auto& c) { return c.score < limit; });
+  return maxima;
 }
 
 // The same pixels by falling score on every instruction set, to the bit where sums are exact. Of
 // others a score at a round corner, where the radicand cancels, can be off by the root of the few
-// 2^-24 that its sums are off.
-void ExpectAsPlain(const SelectorParams& params, const Image& image, bool exact,
-                   std::vector<FeatureSelector::Candidate> expected) {
+// 2^-24 that its sums are off. Gives the number of pixels, and counts radicands below 0.
+std::size_t ExpectAsPlain(const SelectorParams& params, const Image& image, bool exact,
+                          int* below_zero = nullptr) {
+  std::vector<FeatureSelector::Candidate> expected = PlainCandidates(params, image, below_zero);
   const auto by_pixel = [](const auto& a, const auto& b) { return a.pixel < b.pixel; };
   if (!exact) std::sort(expected.begin(), expected.end(), by_pixel);
   std::vector<FeatureSelector::Candidate> first;
@@ -153,44 +148,42 @@ void ExpectAsPlain(const SelectorParams& params, const Image& image, bool exact,
       ASSERT_NEAR(found[i].score / expected[i].score, 1.0f, exact ? 0.0f : 0x1p-11f);
     }
   });
+  return expected.size();
 }
 
-TEST(FeatureSelectorCandidates, WorkedCorners) {
-  const Image corner = Image(48, 48, 40.0f).Fill(18, 20, 48, 48, 200.0f);
-  EXPECT_THAT(Texts(Candidates(Small(), corner)), ElementsAre("19,21 358400"));
-  const Image square = Image(48, 48, 40.0f).Fill(18, 20, 27, 29, 200.0f);
-  EXPECT_THAT(Texts(Candidates(Small(), square)),
-              ElementsAre("19,21 358400", "25,21 358400", "19,27 358400", "25,27 358400"));
-  SelectorParams smoothed = Small();
-  smoothed.half_winx = smoothed.half_winy = 7;
-  smoothed.border = 12;
-  smoothed.presmoothing = true;
-  const FeatureSelector found = Candidates(smoothed, corner);
-  ASSERT_EQ(found.candidates.size(), 1u);
-  EXPECT_EQ(found.candidates[0].pixel, 25u * 48 + 23);
-  EXPECT_NEAR(found.candidates[0].score, 370829.8f, 1.0f);
+TEST(FeatureSelectorCandidates, TheFloorPerWindowPixelAndTheCapOnTheBest) {
+  // Two strong corners, and one whose contrast is a tenth.
+  const Image image = Image(90, 48, 40.0f).Fill(18, 20, 40, 48, 200.0f).Fill(66, 20, 90, 48, 56.0f);
+  const struct {
+    float threshold, max_eig, min_eig;
+    bool faint;
+  } cases[] = {{0.02f, 6000, 1, true},   // 0.02 * 6000 * 25 = 3000
+               {0.02f, 8000, 1, false},  // 4000
+               {0, 8000, 143, true},     // 3575
+               {0, 8000, 144, false}};   // 3600
+  for (const auto& c : cases) {
+    SelectorParams params;
+    params.half_winx = params.half_winy = 2;
+    params.border = 6;
+    params.presmoothing = false;
+    params.threshold = c.threshold;
+    params.max_eig = c.max_eig;
+    params.min_eig = c.min_eig;
+    std::vector<std::string> expected = {"19,21 358400", "38,21 358400"};
+    if (c.faint) expected.push_back("67,21 3584");
+    EXPECT_EQ(Texts(Candidates(params, image)), expected) << c.max_eig << ' ' << c.min_eig;
+  }
 }
 
 // Windows lower than a group of rows of the running sums, of every remainder over whole groups, and
 // wider than a segment of a folded row is long.
 TEST(FeatureSelectorCandidates, EqualThePlainSelectorForEveryWindow) {
+  constexpr std::uint64_t kHalves[][2] = {{0, 0}, {1, 1},  {1, 2},  {2, 2},   {0, 5},
+                                          {1, 3}, {3, 4},  {6, 0},  {7, 4},   {4, 7},
+                                          {9, 9}, {3, 11}, {15, 8}, {15, 15}, {20, 20}};
   unsigned seed = 1;
   std::size_t total = 0;
-  for (const auto& [hx, hy] : {std::pair{0, 0},
-                               {1, 1},
-                               {1, 2},
-                               {2, 2},
-                               {0, 5},
-                               {1, 3},
-                               {3, 4},
-                               {6, 0},
-                               {7, 4},
-                               {4, 7},
-                               {9, 9},
-                               {3, 11},
-                               {15, 8},
-                               {15, 15},
-                               {20, 20}}) {
+  for (const auto& [hx, hy] : kHalves) {
     for (const auto& [width, height] :
          {std::pair{64, 48}, {97, 61}, {47, 90}, {11, 130}, {130, 11}, {231, 170}}) {
       for (const bool smooth : {false, true}) {
@@ -203,9 +196,7 @@ TEST(FeatureSelectorCandidates, EqualThePlainSelectorForEveryWindow) {
         const Image image = RandomImage(width, height, seed, !smooth);
         SCOPED_TRACE(::testing::Message() << width << " half " << hx << ',' << hy << " border "
                                           << params.border << ' ' << smooth);
-        const auto expected = PlainCandidates(params, image);
-        total += expected.size();
-        ExpectAsPlain(params, image, !smooth, expected);
+        total += ExpectAsPlain(params, image, !smooth);
       }
     }
   }
@@ -226,9 +217,7 @@ TEST(FeatureSelectorCandidates, EqualThePlainSelectorOnRoundBlobs) {
   for (const std::uint64_t half : {2, 3, 5, 7}) {
     SelectorParams params;
     params.half_winx = params.half_winy = half;
-    const auto expected = PlainCandidates(params, blobs, &below_zero);
-    EXPECT_GT(expected.size(), 5u);
-    ExpectAsPlain(params, blobs, false, expected);
+    EXPECT_GT(ExpectAsPlain(params, blobs, false, &below_zero), 5u);
   }
   EXPECT_GT(below_zero, 0);
 }
@@ -251,19 +240,18 @@ TEST(FeatureSelectorCandidates, StrongTextureLeavesNoTraceAboutIt) {
 }
 
 TEST(FeatureSelectorCandidates, FlatTransparentStraightAndTinyFramesHaveNone) {
-  SelectorParams params;
-  EXPECT_THAT(Texts(Candidates(params, Image(90, 80, 173.0f))), IsEmpty());
   Image transparent = RandomImage(90, 80, 4);
   std::fill(transparent.mask.begin(), transparent.mask.end(), 0);
-  FeatureSelector selector = Candidates(params, transparent);
-  selector.SelectFirst();
-  EXPECT_THAT(selector.selected, IsEmpty());
-  EXPECT_THAT(Texts(Candidates(params, Image(90, 80, 20.0f).Fill(40, 0, 90, 80, 220.0f))),
-              IsEmpty());
+  for (const Image& image :
+       {Image(90, 80, 173.0f), transparent, Image(90, 80, 20.0f).Fill(40, 0, 90, 80, 220.0f)}) {
+    FeatureSelector selector = Candidates({}, image);
+    EXPECT_THAT(Texts(selector), IsEmpty());
+    selector.SelectFirst();
+    EXPECT_THAT(selector.selected, IsEmpty());
+  }
   for (const auto& [w, h] : {std::pair{1, 1}, {2, 5}, {12, 12}, {24, 24}, {25, 300}, {400, 3}}) {
     SCOPED_TRACE(::testing::Message() << w << 'x' << h);
-    const Image tiny = RandomImage(w, h, 5);
-    ExpectAsPlain(params, tiny, false, PlainCandidates(params, tiny));
+    ExpectAsPlain({}, RandomImage(w, h, 5), false);
   }
   // Lengths beyond any image.
   for (auto SelectorParams::*field :
@@ -289,69 +277,38 @@ TEST(FeatureSelectorCandidates, APresmoothFactorThatMeansNothingSmoothsNothing) 
   EXPECT_THAT(Texts(Candidates(params, image)), IsEmpty());  // smoothed to grey
 }
 
-TEST(FeatureSelectorCandidates, TheFloorPerWindowPixelAndTheCapOnTheBest) {
-  // A strong corner, and one whose contrast is a tenth: scores 358400 and 3584.
-  const Image image = Image(90, 48, 40.0f).Fill(18, 20, 40, 48, 200.0f).Fill(66, 20, 90, 48, 56.0f);
-  SelectorParams params = Small();
-  params.threshold = 0.02f;  // 0.02 * 6000 * 25 = 3000
-  EXPECT_THAT(Texts(Candidates(params, image)), ::testing::Contains("67,21 3584"));
-  params.max_eig = 8000.0f;  // 4000
-  EXPECT_THAT(Texts(Candidates(params, image)), ::testing::Not(::testing::Contains("67,21 3584")));
-  params.threshold = 0.0f;
-  params.min_eig = 143.0f;  // 3575
-  EXPECT_THAT(Texts(Candidates(params, image)), ::testing::Contains("67,21 3584"));
-  params.min_eig = 144.0f;
-  EXPECT_THAT(Texts(Candidates(params, image)), ::testing::Not(::testing::Contains("67,21 3584")));
+// Selections from candidates that the case sets itself.
+FeatureSelector Selector(std::uint64_t spacing, std::uint64_t max_count = 100) {
+  SelectorParams params;
+  params.spacing = spacing;
+  params.max_count = max_count;
+  FeatureSelector selector(params);
+  selector.Configure(40, 30);
+  return selector;
 }
 
-// Selections from candidates that the case sets itself.
-class FeatureSelectionTest : public ::testing::Test {
- protected:
-  FeatureSelector Selector(std::uint64_t spacing, std::uint64_t max_count = 100) {
-    SelectorParams params;
-    params.spacing = spacing;
-    params.max_count = max_count;
-    FeatureSelector selector(params);
-    selector.Configure(40, 30);
-    return selector;
-  }
-  // Which pixels of the image can still be selected: every pixel alone as the one candidate.
-  std::vector<std::string> Free(FeatureSelector& selector, float x, float y, std::int32_t status) {
-    const tracking_feature<float> cell{x, y, status, 0};
-    std::vector<std::string> rows(30, std::string(40, '.'));
-    for (std::uint32_t i = 0; i < 1200; ++i) {
-      selector.candidates = {{i, 1.0f}};
-      selector.SelectAvoiding(&cell, 1);
-      if (selector.selected.empty()) rows[i / 40][i % 40] = '#';
-    }
-    return rows;
-  }
-};
+std::vector<std::string> Selected(const FeatureSelector& selector) {
+  std::vector<std::string> texts;
+  for (const auto& f : selector.selected) texts.push_back(Text(f.x, f.y, f.score));
+  return texts;
+}
 
-TEST_F(FeatureSelectionTest, TheBetterOfTwoWithinTheSpacingAndTheDiscsRim) {
+TEST(FeatureSelectionTest, TheBetterOfTwoWithinTheSpacingAndTheDiscsRim) {
   FeatureSelector selector = Selector(5);
   // (3, 4) lies on the circle; (4, 4) outside; (5, 0) on it; (6, 0) outside.
-  selector.candidates = {{10 * 40 + 10, 9.0f},
-                         {14 * 40 + 13, 8.0f},
-                         {14 * 40 + 14, 7.0f},
-                         {10 * 40 + 5, 6.0f},
-                         {10 * 40 + 4, 5.0f}};
+  const auto at = [](std::uint32_t x, std::uint32_t y) { return 40 * y + x; };
+  selector.candidates = {
+      {at(10, 10), 9}, {at(13, 14), 8}, {at(14, 14), 7}, {at(5, 10), 6}, {at(4, 10), 5}};
   for (const int round : {0, 1}) {  // no selection is in another's way
     selector.SelectFirst();
-    ASSERT_EQ(selector.selected.size(), 3u) << round;
-    EXPECT_EQ(selector.selected[1].x, 14.0f);
-    EXPECT_EQ(selector.selected[1].y, 14.0f);
-    EXPECT_EQ(selector.selected[1].score, 7.0f);
-    EXPECT_EQ(selector.selected[2].x, 4.0f);
+    EXPECT_THAT(Selected(selector), ElementsAre("10,10 9", "14,14 7", "4,10 5")) << round;
     const tracking_feature<float> cell{15.0f, 14.0f, 0, 0.0f};
     selector.SelectAvoiding(&cell, 1);
-    ASSERT_EQ(selector.selected.size(), 2u) << round;
-    EXPECT_EQ(selector.selected[0].x, 10.0f);
-    EXPECT_EQ(selector.selected[1].x, 4.0f);
+    EXPECT_THAT(Selected(selector), ElementsAre("10,10 9", "4,10 5")) << round;
   }
 }
 
-TEST_F(FeatureSelectionTest, StopsAtTheCountOrTheLimit) {
+TEST(FeatureSelectionTest, StopsAtTheCountOrTheLimit) {
   FeatureSelector selector = Selector(1, 2);
   selector.candidates = {{0, 9.0f}, {10, 8.0f}, {20, 7.0f}};
   selector.SelectFirst();
@@ -367,30 +324,24 @@ TEST_F(FeatureSelectionTest, StopsAtTheCountOrTheLimit) {
   EXPECT_EQ(wide.selected.size(), 1u);
 }
 
-TEST_F(FeatureSelectionTest, LiveFeaturesKeepTheirDistanceFromTheirRealCentre) {
+// Dead, far and unbounded ones cover nothing.
+TEST(FeatureSelectionTest, LiveFeaturesKeepTheirDistanceFromTheirRealCentre) {
   FeatureSelector selector = Selector(4);
-  for (const auto& [cx, cy] :
-       {std::pair{20.3f, 12.6f}, {0.5f, 29.4f}, {-3.5f, 10.0f}, {7.f, 7.f}}) {
-    const auto rows = Free(selector, cx, cy, 0);
-    for (int y = 0; y < 30; ++y) {
-      for (int x = 0; x < 40; ++x) {
-        const bool near = std::hypot(x - cx, y - cy) <= 4.0;
-        ASSERT_EQ(rows[y][x], near ? '#' : '.') << cx << ',' << cy << " at " << x << ',' << y;
-      }
+  constexpr float kInf = std::numeric_limits<float>::infinity();
+  const tracking_feature<float> cells[] = {
+      {20.3f, 12.6f, 0, 0}, {0.5f, 29.4f, 0, 0}, {-3.5f, 10, 0, 0},
+      {7, 7, 3, 0},         {20, 15, -1, 0},     {20, 15, -10, 0},
+      {1e30f, 15, 0, 0},    {20, -kInf, 0, 0},   {std::nanf(""), 15, 3, 0}};
+  for (const auto& cell : cells) {
+    for (std::uint32_t i = 0; i < 1200; ++i) {  // every pixel alone as the one candidate
+      const int x = i % 40, y = i / 40;
+      selector.candidates = {{i, 1.0f}};
+      selector.SelectAvoiding(&cell, 1);
+      const bool near = cell.status >= 0 && std::hypot(x - cell.x, y - cell.y) <= 4.0;
+      ASSERT_EQ(selector.selected.empty(), near)
+          << cell.x << ',' << cell.y << " at " << x << ',' << y;
     }
   }
-}
-
-TEST_F(FeatureSelectionTest, DeadFarAndUnboundedFeaturesCoverNothing) {
-  FeatureSelector selector = Selector(4);
-  const std::vector<std::string> all_free(30, std::string(40, '.'));
-  constexpr float kInf = std::numeric_limits<float>::infinity();
-  EXPECT_EQ(Free(selector, 20, 15, -1), all_free);
-  EXPECT_EQ(Free(selector, 20, 15, -10), all_free);
-  EXPECT_EQ(Free(selector, 1e30f, 15, 0), all_free);
-  EXPECT_EQ(Free(selector, 20, -kInf, 0), all_free);
-  EXPECT_EQ(Free(selector, std::nanf(""), 15, 3), all_free);
-  EXPECT_NE(Free(selector, 20, 15, 3), all_free);
 }
 
 }  // namespace

@@ -36,10 +36,6 @@ ImagePyramid Picture(std::size_t width, std::size_t height, std::size_t channels
   return pyramid;
 }
 
-inline level_image Level0(const ImagePyramid& pyramid) {
-  return pyramid.Level(0);
-}
-
 // A template around a point of level 0, and room for a sample.
 struct Template {
   Template(const ImagePyramid& pyramid, std::size_t half, float anchor_x, float anchor_y)

@@ -135,12 +135,6 @@ TEST(TrackingRunTest, NewFeaturesKeepAwayFromLiveOnes) {
 TEST(TrackingRunTest, SettingsThatSwitchThingsOff) {
   DrawnFrames source(
       6, [](double x, double y, std::size_t f) { return f == 3 ? 0.0 : Drifting(x, y, f); });
-  TrackerParams off;
-  off.affine_verification = false;
-  const Tracked plain(source, off);
-  EXPECT_THAT(plain.statuses(2), Each(0));
-  EXPECT_EQ(plain.cell(2, 0).correlation, 0.0f);
-
   TrackerParams no_levels;
   no_levels.pyramidal_levels = 0;
   EXPECT_THAT(Tracked(source, no_levels).statuses(1), Each(2)) << "lost and found each frame";

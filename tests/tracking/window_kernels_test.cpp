@@ -152,14 +152,9 @@ TEST(WindowKernelsTest, AffineSamplesInTheMiddleAndAtTheEdges) {
           if (where > 0) return std::ceil(static_cast<float>(size - 1) - reach - f) - 1;
           return size / 2;
         };
-        affine_sampling warp{place(image.width, reach_x, kFx),
-                             place(image.height, reach_y, kFy),
-                             kFx,
-                             kFy,
-                             m[0],
-                             m[1],
-                             m[2],
-                             m[3]};
+        const std::ptrdiff_t column = place(image.width, reach_x, kFx);
+        const std::ptrdiff_t row = place(image.height, reach_y, kFy);
+        const affine_sampling warp{column, row, kFx, kFy, m[0], m[1], m[2], m[3]};
         ASSERT_TRUE(kernels::AffineWindowInside(warp, shape, image.width, image.height));
         std::vector<float> out(shape.plane_size(), kNaN), of_bytes = out;
         kernels::SampleAffine(image.floats.data(), image.width, image.height, warp, shape,
