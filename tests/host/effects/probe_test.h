@@ -1,6 +1,6 @@
 #pragma once
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 
 #include <boost/make_shared.hpp>
 #include <cstdint>
@@ -35,6 +35,15 @@ class ProbeTest : public testing::Test {
     HX_World* output;
     void* extra;
     const HX_Callbacks& cb() const { return *in->cb; }
+    HX_EffectRef ref() const { return in->effect_ref; }
+    // Goes back with the pointer.
+    template <class Table>
+    std::shared_ptr<const Table> Suite(const char* name, std::int32_t version) const {
+      const void* table = nullptr;
+      EXPECT_EQ(in->basic->acquire(name, version, &table), HX_ERR_NONE) << name;
+      return {static_cast<const Table*>(table),
+              [=, basic = in->basic](const Table*) { basic->release(name, version); }};
+    }
   };
   using Deed = std::function<HX_Err(const Call&)>;
 
@@ -74,19 +83,6 @@ class ProbeTest : public testing::Test {
     const std::string report = host->LeakReport();
     host.reset();
     return report;
-  }
-
-  template <class Table>
-  static const Table& Acquired(const Call& call, const char* name, std::int32_t version) {
-    const void* table = nullptr;
-    EXPECT_EQ(call.in->basic->acquire(name, version, &table), HX_ERR_NONE) << name;
-    return *static_cast<const Table*>(table);
-  }
-  // Runs `work` with a suite.
-  template <class Table, class Work>
-  static void With(const Call& call, const char* name, std::int32_t version, const Work& work) {
-    work(Acquired<Table>(call, name, version));
-    call.in->basic->release(name, version);
   }
 
   std::map<std::uint32_t, Deed> on;  // by command; none: it does nothing

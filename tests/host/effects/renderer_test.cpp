@@ -44,51 +44,48 @@ class RendererTest : public ProbeTest {
     };
     on[HX_CMD_RENDER_FRAME] = [this](const Call& call) -> HX_Err {
       if (offset == 0) return Draw(call, call.params[0]->u.ld, call.output);
-      HX_ParamDef input{};
       const HX_InData& in = *call.in;
-      const std::int32_t time = in.current_time + offset * in.time_step;
-      if (const HX_Err code = call.cb().checkout_param(in.effect_ref, 0, time, in.time_step,
-                                                       in.time_scale, &input)) {
-        return code;
-      }
-      const HX_Err code = Draw(call, input.u.ld, call.output);
-      call.cb().checkin_param(in.effect_ref, &input);
+      HX_ParamDef input{};
+      HX_Err code = call.cb().checkout_param(call.ref(), 0, in.current_time + offset * in.time_step,
+                                             in.time_step, in.time_scale, &input);
+      if (code != HX_ERR_NONE) return code;
+      code = Draw(call, input.u.ld, call.output);
+      call.cb().checkin_param(call.ref(), &input);
       return code;
     };
     on[HX_CMD_PLAN_FRAME] = [this](const Call& call) -> HX_Err {
       auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
       const HX_InData& in = *call.in;
-      HX_CheckoutResult results[3];
+      HX_CheckoutResult results[3] = {};
+      HX_Err code = HX_ERR_NONE;
       // Twice each: the second order widens the first.
       for (const HX_Rect& wanted : {HX_Rect{1, 1, 2, 2}, HX_Rect{0, 0, 1 << 15, 1 << 15}}) {
-        for (const int id : {-1, 0, 1}) {
+        for (int id = -1; id <= 1 && code == HX_ERR_NONE; ++id) {
           const HX_RenderRequest request{wanted, plan.request.bit_depth};
-          const std::int32_t time = in.current_time + id * in.time_step;
-          if (const HX_Err code =
-                  plan.checkout_layer(in.effect_ref, 0, id, &request, time, in.time_step,
-                                      in.time_scale, &results[1 + id])) {
-            return code;
-          }
+          code =
+              plan.checkout_layer(call.ref(), 0, id, &request, in.current_time + id * in.time_step,
+                                  in.time_step, in.time_scale, &results[1 + id]);
         }
       }
-      const HX_Rect& rect = results[1].full_rect;
-      plan.full_rect = {rect.left - margin, rect.top - margin, rect.right + margin,
-                        rect.bottom + margin};
+      const auto& [left, top, right, bottom] = results[1].full_rect;
+      plan.full_rect = {left - margin, top - margin, right + margin, bottom + margin};
       plan.result_rect = plan.full_rect;
       plan.may_exceed = margin > 0;
-      return HX_ERR_NONE;
+      return code;
     };
     on[HX_CMD_RENDER_PLANNED_FRAME] = [this](const Call& call) -> HX_Err {
       const auto& render = *static_cast<HX_RenderExtra*>(call.extra);
       HX_World *output = nullptr, *input = nullptr;
-      render.checkout_output(call.in->effect_ref, &output);
-      if (const HX_Err code = render.checkout_layer_pixels(call.in->effect_ref, offset, &input)) {
-        return code;
-      }
-      const HX_Err code = Draw(call, *input, output);
-      render.checkin_layer_pixels(call.in->effect_ref, offset);
+      render.checkout_output(call.ref(), &output);
+      HX_Err code = render.checkout_layer_pixels(call.ref(), offset, &input);
+      if (code != HX_ERR_NONE) return code;
+      code = Draw(call, *input, output);
+      render.checkin_layer_pixels(call.ref(), offset);
       return code;
     };
+    Begin();
+  }
+  void Begin() {
     Start();
     effect = &session->Apply(MakeDrawnLayer());
     renderer = effect->MakeRenderer();
@@ -102,7 +99,7 @@ class RendererTest : public ProbeTest {
   static HX_Err Draw(const Call& call, const HX_World& from, HX_World* to) {
     const std::int32_t x = from.origin_x - to->origin_x, y = from.origin_y - to->origin_y;
     const HX_Rect place = {x, y, x + from.width, y + from.height};
-    return call.cb().copy_world(call.in->effect_ref, &from, to, nullptr, &place);
+    return call.cb().copy_world(call.ref(), &from, to, nullptr, &place);
   }
   RenderedFrame Render(bool direct, const RenderRequest& request) {
     return direct ? renderer->Direct(request) : renderer->Planned(request);
@@ -210,18 +207,14 @@ TEST_F(RendererTest, ParametersStayAsTheyWereWhenTheRenderBegan) {
     const HX_InData& in = *call.in;
     HX_ParamDef amount = *call.params[1];
     amount.u.fs.value += 1;
-    With<HX_ParamUtilsSuite3>(call, HX_PARAM_UTILS_SUITE, 3, [&](const HX_ParamUtilsSuite3& utils) {
-      EXPECT_EQ(utils.SetParamValue(in.effect_ref, 1, &amount), HX_ERR_NONE);
-    });
-    call.cb().checkout_param(in.effect_ref, 1, in.current_time, in.time_step, in.time_scale,
-                             &amount);
+    const auto utils = call.Suite<HX_ParamUtilsSuite3>(HX_PARAM_UTILS_SUITE, 3);
+    EXPECT_EQ(utils->SetParamValue(call.ref(), 1, &amount), HX_ERR_NONE);
+    call.cb().checkout_param(call.ref(), 1, in.current_time, in.time_step, in.time_scale, &amount);
     seen.push_back(amount.u.fs.value);
-    call.cb().checkin_param(in.effect_ref, &amount);
+    call.cb().checkin_param(call.ref(), &amount);
     return HX_ERR_NONE;
   };
-  Start();
-  effect = &session->Apply(MakeDrawnLayer());
-  renderer = effect->MakeRenderer();
+  Begin();
   for (const bool direct : {true, false}) Render(direct, {1});
   EXPECT_EQ(seen, (std::vector<double>{5, 6}));
 }
