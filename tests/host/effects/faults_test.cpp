@@ -1,7 +1,6 @@
 // Plug-ins that misbehave.
 
 #include <stdexcept>
-#include <string>
 #include <vector>
 
 #include "platform/hx/hx_suites.h"
@@ -10,7 +9,7 @@
 namespace calmframe::host {
 namespace {
 
-class FaultsTest : public ProbeTest {
+class FaultsTest : public FrameProbe {
  protected:
   // An effect on a layer, and a frame by each path.
   void Play() {
@@ -19,18 +18,7 @@ class FaultsTest : public ProbeTest {
     direct = renderer->Direct({3}).result;
     planned = renderer->Planned({3}).result;
   }
-  static HX_Err WholeFrame(const Call& call) {
-    auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
-    plan.full_rect = plan.result_rect = plan.request.rect;
-    HX_CheckoutResult result;
-    return plan.checkout_layer(call.ref(), 0, 7, &plan.request, call.in->current_time,
-                               call.in->time_step, call.in->time_scale, &result);
-  }
-  static HX_Err FrameOfTheLayer(const Call& call) {
-    call.out->width = kClipWidth;
-    call.out->height = kClipHeight;
-    return HX_ERR_NONE;
-  }
+  static HX_Err Refuse(const Call&) { return 77; }
 
   CommandResult direct, planned;
 };
@@ -38,6 +26,7 @@ class FaultsTest : public ProbeTest {
 TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
   static const char* const kTexts[] = {"$$$/A=B", nullptr};
   static const HX_StringTable kTable = {2, 7, kTexts};
+  const auto usual = on;
   const struct {
     const char* told;
     std::uint32_t command;
@@ -96,21 +85,21 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
       {"entry: an exception came out\n", HX_CMD_CREATE_INSTANCE,
        [](const Call&) { throw std::runtime_error("not caught"); }},
       {"plan.checkout_layer: one id for two times\n", HX_CMD_PLAN_FRAME,
-       [](const Call& call) {
+       [&](const Call& call) {
          call.in->current_time += call.in->time_step;
-         EXPECT_EQ(WholeFrame(call), HX_ERR_UNKNOWN);
+         EXPECT_EQ(usual.at(HX_CMD_PLAN_FRAME)(call), HX_ERR_UNKNOWN);
        }},
       {"render.checkout_layer_pixels: a frame was not checked in\n", HX_CMD_RENDER_PLANNED_FRAME,
        [](const Call& call) {
          HX_World* world = nullptr;
          const auto& render = *static_cast<HX_RenderExtra*>(call.extra);
-         EXPECT_EQ(render.checkout_layer_pixels(call.ref(), 7, &world), HX_ERR_NONE);
+         EXPECT_EQ(render.checkout_layer_pixels(call.ref(), 0, &world), HX_ERR_NONE);
          EXPECT_NE(render.checkout_layer_pixels(call.ref(), 8, &world), HX_ERR_NONE);
        }},
       {"render.checkin_layer_pixels: a frame that is not checked out\n",
        HX_CMD_RENDER_PLANNED_FRAME,
        [](const Call& call) {
-         static_cast<HX_RenderExtra*>(call.extra)->checkin_layer_pixels(call.ref(), 7);
+         static_cast<HX_RenderExtra*>(call.extra)->checkin_layer_pixels(call.ref(), 0);
        }},
       {"output: written behind its rows\n", HX_CMD_RENDER_FRAME,
        [](const Call& call) {
@@ -119,9 +108,9 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
   };
   for (const auto& misdeed : misdeeds) {
     SCOPED_TRACE(misdeed.told);
-    on = {{HX_CMD_PREPARE_FRAME, FrameOfTheLayer}, {HX_CMD_PLAN_FRAME, WholeFrame}};
-    on[misdeed.command] = [&, usual = on[misdeed.command]](const Call& call) -> HX_Err {
-      const HX_Err code = usual ? usual(call) : HX_ERR_NONE;
+    on = usual;
+    on[misdeed.command] = [&, deed = on[misdeed.command]](const Call& call) -> HX_Err {
+      const HX_Err code = deed ? deed(call) : HX_ERR_NONE;
       misdeed.deed(call);
       return code;
     };
@@ -132,7 +121,6 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
 }
 
 TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
-  const auto refuse = [](const Call&) { return 77; };
   const auto say = [](const Call& call) {
     call.out->out_flags |= HX_OUT_FLAG_SHOW_MESSAGE;
     call.cb().copy_text(call.out->return_msg, HX_RETURN_MSG_SIZE, "No room.");
@@ -152,7 +140,7 @@ TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
   const struct {
     Deed prepare, plan;
     std::string line;
-  } cases[] = {{refuse, refuse, "it: the plug-in answered 77"},
+  } cases[] = {{Refuse, Refuse, "it: the plug-in answered 77"},
                {say, say, "it: No room."},
                {grow, exceed, "it: the plug-in answered " + std::to_string(HX_ERR_UNKNOWN)}};
   for (const auto& c : cases) {
@@ -166,7 +154,6 @@ TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
 }
 
 TEST_F(FaultsTest, AStartThatFailsIsToldAndLeavesNothing) {
-  const auto refuse = [](const Call&) { return 77; };
   const auto miscount = [](const Call& call) -> HX_Err {
     call.out->num_params = 3;
     return HX_ERR_NONE;
@@ -179,9 +166,9 @@ TEST_F(FaultsTest, AStartThatFailsIsToldAndLeavesNothing) {
     Deed deed;
     std::string told;
   } cases[] = {
-      {HX_CMD_START_PLUGIN, refuse, "Probe: the plug-in answered 77"},
+      {HX_CMD_START_PLUGIN, Refuse, "Probe: the plug-in answered 77"},
       {HX_CMD_START_PLUGIN, make, "Probe: the plug-in answered " + std::to_string(HX_ERR_MEMORY)},
-      {HX_CMD_DECLARE_PARAMS, refuse, "Probe: the plug-in answered 77"},
+      {HX_CMD_DECLARE_PARAMS, Refuse, "Probe: the plug-in answered 77"},
       {HX_CMD_DECLARE_PARAMS, miscount, "Probe: tells of 3 parameters and declares 1"}};
   Operations::Get().FailAlways("new_handle");
   for (const auto& c : cases) {

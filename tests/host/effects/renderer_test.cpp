@@ -2,7 +2,6 @@
 
 #include <array>
 #include <cmath>
-#include <vector>
 
 #include "host/pixels/world_operations.h"
 #include "tests/host/effects/probe_test.h"
@@ -32,59 +31,9 @@ Rgb At(const WorldBuffer& buffer, int x, int y) {
   return rgb;
 }
 
-// An effect that shows its input, or another frame, in the middle of an output that may be larger.
-class RendererTest : public ProbeTest {
+class RendererTest : public FrameProbe {
  protected:
-  RendererTest() {
-    on[HX_CMD_PREPARE_FRAME] = [this](const Call& call) -> HX_Err {
-      call.out->width = call.params[0]->u.ld.width + 2 * margin;
-      call.out->height = call.params[0]->u.ld.height + 2 * margin;
-      call.out->origin_x = call.out->origin_y = margin;
-      return HX_ERR_NONE;
-    };
-    on[HX_CMD_RENDER_FRAME] = [this](const Call& call) -> HX_Err {
-      if (offset == 0) return Draw(call, call.params[0]->u.ld, call.output);
-      const HX_InData& in = *call.in;
-      HX_ParamDef input{};
-      HX_Err code = call.cb().checkout_param(call.ref(), 0, in.current_time + offset * in.time_step,
-                                             in.time_step, in.time_scale, &input);
-      if (code != HX_ERR_NONE) return code;
-      code = Draw(call, input.u.ld, call.output);
-      call.cb().checkin_param(call.ref(), &input);
-      return code;
-    };
-    on[HX_CMD_PLAN_FRAME] = [this](const Call& call) -> HX_Err {
-      auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
-      const HX_InData& in = *call.in;
-      HX_CheckoutResult results[3] = {};
-      HX_Err code = HX_ERR_NONE;
-      // Twice each: the second order widens the first.
-      for (const HX_Rect& wanted : {HX_Rect{1, 1, 2, 2}, HX_Rect{0, 0, 1 << 15, 1 << 15}}) {
-        for (int id = -1; id <= 1 && code == HX_ERR_NONE; ++id) {
-          const HX_RenderRequest request{wanted, plan.request.bit_depth};
-          code =
-              plan.checkout_layer(call.ref(), 0, id, &request, in.current_time + id * in.time_step,
-                                  in.time_step, in.time_scale, &results[1 + id]);
-        }
-      }
-      const auto& [left, top, right, bottom] = results[1].full_rect;
-      plan.full_rect = {left - margin, top - margin, right + margin, bottom + margin};
-      plan.result_rect = plan.full_rect;
-      plan.may_exceed = margin > 0;
-      return code;
-    };
-    on[HX_CMD_RENDER_PLANNED_FRAME] = [this](const Call& call) -> HX_Err {
-      const auto& render = *static_cast<HX_RenderExtra*>(call.extra);
-      HX_World *output = nullptr, *input = nullptr;
-      render.checkout_output(call.ref(), &output);
-      HX_Err code = render.checkout_layer_pixels(call.ref(), offset, &input);
-      if (code != HX_ERR_NONE) return code;
-      code = Draw(call, *input, output);
-      render.checkin_layer_pixels(call.ref(), offset);
-      return code;
-    };
-    Begin();
-  }
+  RendererTest() { Begin(); }
   void Begin() {
     Start();
     effect = &session->Apply(MakeDrawnLayer());
@@ -95,17 +44,10 @@ class RendererTest : public ProbeTest {
     ProbeTest::TearDown();
   }
 
-  // Layer (0, 0) of `from` lies at its origin; so it does in `to`.
-  static HX_Err Draw(const Call& call, const HX_World& from, HX_World* to) {
-    const std::int32_t x = from.origin_x - to->origin_x, y = from.origin_y - to->origin_y;
-    const HX_Rect place = {x, y, x + from.width, y + from.height};
-    return call.cb().copy_world(call.ref(), &from, to, nullptr, &place);
-  }
   RenderedFrame Render(bool direct, const RenderRequest& request) {
     return direct ? renderer->Direct(request) : renderer->Planned(request);
   }
 
-  int margin = 0, offset = 0;  // pixels on each side; frames
   Effect* effect = nullptr;
   std::unique_ptr<Renderer> renderer;
 };

@@ -1,11 +1,8 @@
 #include "host/effects/session.h"
 
-#include <gmock/gmock.h>
-
 #include <deque>
 #include <thread>
 #include <utility>
-#include <vector>
 
 #include "tests/host/effects/probe_test.h"
 

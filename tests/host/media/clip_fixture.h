@@ -2,10 +2,6 @@
 
 #include <gmock/gmock.h>
 
-#include <filesystem>
-#include <string>
-#include <vector>
-
 #include "tests/support/drawn_clip.h"
 #include "tests/support/scratch_folder.h"
 #include "tests/support/shell.h"
@@ -19,26 +15,19 @@ inline std::string Output(const std::string& command) {
   return outcome.text;
 }
 
+// A failure of that side, told in one line.
+inline auto Fails(Failure::Side side, const testing::Matcher<std::string>& line) {
+  const auto told = [](const Failure& failure) { return std::string(failure.what()); };
+  return testing::Throws<Failure>(
+      testing::AllOf(testing::Field(&Failure::side, side), testing::ResultOf(told, line),
+                     testing::ResultOf(told, testing::Not(testing::HasSubstr("\n")))));
+}
+
 // Each test has a folder of its own.
 class ClipTest : public testing::Test, protected ScratchFolder {
  protected:
   static void Ffmpeg(const std::string& arguments) {
     Output("ffmpeg -nostdin -y -v error " + arguments);
-  }
-
-  // Line of the failure; the wrong side or none fails the test.
-  template <class Action>
-  static std::string LineOf(Failure::Side side, Action action) {
-    try {
-      action();
-    } catch (const Failure& failure) {
-      EXPECT_EQ(failure.side, side);
-      const std::string line = failure.what();
-      EXPECT_EQ(line.find('\n'), std::string::npos);
-      return line;
-    }
-    ADD_FAILURE() << "nothing was refused";
-    return {};
   }
 };
 

@@ -133,8 +133,8 @@ TEST_F(ClipReaderTest, DamageAnywhereIsToldOrBreaksThePromiseInEveryRun) {
     try {
       decoded = ClipReader::Open(In("a.mp4"));
     } catch (const Failure& failure) {
-      EXPECT_EQ(LineOf(Failure::Side::input, [&] { ClipReader::OpenPromised(In("a.mp4")); }),
-                failure.what());
+      EXPECT_THAT([&] { ClipReader::OpenPromised(In("a.mp4")); },
+                  Fails(Failure::Side::input, failure.what()));
       continue;
     }
     const auto promised = ClipReader::OpenPromised(In("a.mp4"));
@@ -144,8 +144,8 @@ TEST_F(ClipReaderTest, DamageAnywhereIsToldOrBreaksThePromiseInEveryRun) {
     }
     if (promised->found()->standing() == Standing::broken) {
       ++broken;
-      LineOf(Failure::Side::input, [&] { promised->Again(); });
-      LineOf(Failure::Side::input, [&] { ReadFrame(*promised, 0); });
+      EXPECT_THAT([&] { promised->Again(); }, Fails(Failure::Side::input, testing::_));
+      EXPECT_THAT([&] { ReadFrame(*promised, 0); }, Fails(Failure::Side::input, testing::_));
       continue;
     }
     EXPECT_EQ(promised->found()->standing(), Standing::decoded);

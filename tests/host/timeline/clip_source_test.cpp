@@ -10,12 +10,8 @@ class ClipSourceTest : public media::ClipTest {};
 
 template <class Pixel>
 std::vector<Pixel> PixelsOf(const PicturePtr& picture) {
-  std::vector<Pixel> pixels;
-  for (int y = 0; y < picture->height(); ++y) {
-    const Pixel* row = picture->row<Pixel>(y);
-    pixels.insert(pixels.end(), row, row + picture->width());
-  }
-  return pixels;
+  const auto* const first = picture->row<Pixel>(0);
+  return {first, first + picture->bytes() / sizeof(Pixel)};
 }
 
 // Of a lossy clip with several keyframes, each frame of its own colours.
