@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstring>
 #include <string>
 #include <vector>
 
@@ -9,17 +10,33 @@
 
 namespace calmframe {
 
-// A clip of info.frame_count frames, each drawn by draw(frame, pixels) into rows without a gap.
-template <class Draw>
-void WriteClip(const std::string& path, const media::ClipInfo& info, const Draw& draw,
-               const media::EncodeSettings& settings = {}) {
+// A clip of info.frame_count frames, each drawn by draw(frame, pixels) into rows without a gap; the
+// writer's warnings.
+template <class Pixel = HX_Pixel8, class Draw>
+std::vector<std::string> WriteClip(const std::string& path, const media::ClipInfo& info,
+                                   const Draw& draw, const media::EncodeSettings& settings = {}) {
   const auto writer = media::ClipWriter::Create(path, info, info.width, info.height, settings);
-  std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(info.width) * info.height);
+  std::vector<Pixel> pixels(static_cast<std::size_t>(info.width) * info.height);
   for (std::size_t f = 0; f < info.frame_count; ++f) {
     draw(static_cast<int>(f), pixels.data());
-    writer->Write(f, pixels.data(), info.width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8)));
+    writer->Write(f, pixels.data(), info.width * static_cast<std::ptrdiff_t>(sizeof(Pixel)));
   }
   writer->Finish();
+  return writer->warnings();
+}
+
+// A frame of a clip, in rows without a gap.
+template <class Pixel = HX_Pixel8>
+std::vector<Pixel> ReadFrame(media::ClipReader& reader, std::size_t frame) {
+  const int width = reader.info().width;
+  std::vector<Pixel> pixels(static_cast<std::size_t>(width) * reader.info().height);
+  reader.Read(frame, pixels.data(), width * static_cast<std::ptrdiff_t>(sizeof(Pixel)));
+  return pixels;
+}
+
+template <class Pixel>
+bool SamePixels(const std::vector<Pixel>& a, const std::vector<Pixel>& b) {
+  return a.size() == b.size() && std::memcmp(a.data(), b.data(), a.size() * sizeof(Pixel)) == 0;
 }
 
 // A walk down the street of that seed.

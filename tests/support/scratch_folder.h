@@ -25,6 +25,9 @@ class ScratchFolder {
     std::ifstream file(folder_ / name, std::ios::binary);
     return {std::istreambuf_iterator<char>(file), {}};
   }
+  void MakeFile(const std::string& name, const std::string& content) const {
+    std::ofstream(folder_ / name, std::ios::binary) << content;
+  }
 
  private:
   std::filesystem::path folder_;

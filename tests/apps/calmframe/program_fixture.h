@@ -4,21 +4,16 @@
 #pragma once
 
 #include <gmock/gmock.h>
-#include <sys/wait.h>
 
 #include <algorithm>
-#include <array>
 #include <cmath>
-#include <cstdio>
-#include <filesystem>
-#include <fstream>
+#include <set>
 #include <string>
-#include <vector>
 
-#include "host/media/clip.h"
 #include "synthetic/texture.h"
 #include "tests/support/drawn_clip.h"
 #include "tests/support/scratch_folder.h"
+#include "tests/support/shell.h"
 
 namespace calmframe {
 
@@ -31,30 +26,28 @@ struct Camera {
   double x = 0, y = 0, angle = 0, zoom = 1;
 };
 
-struct Outcome {
-  int code;
-  std::string text;  // standard output and error together
-};
-
-class ProgramTest : public ::testing::Test {
+class ProgramTest : public ::testing::Test, protected ScratchFolder {
  protected:
-  std::string Path(const std::string& name) const { return scratch_.In(name); }
-  std::string Content(const std::string& name) const { return scratch_.Content(name); }
+  std::string Path(const std::string& name) const { return In(name); }
 
-  Outcome Run(const std::string& arguments) const { return RunAfter("", arguments); }
+  // Standard output and error together; `before` stands before the program in the shell's line.
+  Outcome Run(const std::string& arguments, const std::string& before = "") const {
+    return Shell("cd '" + path().string() + "' && { " + before + CALMFRAME_PROGRAM " " + arguments +
+                 "; } 2>&1");
+  }
 
-  // `before` stands before the program in the shell's line. A program that a signal ended has the
-  // code -1.
-  Outcome RunAfter(const std::string& before, const std::string& arguments) const {
-    const std::string command = "cd '" + folder_.string() + "' && { " + before +
-                                CALMFRAME_PROGRAM " " + arguments + "; } 2>&1";
-    Outcome outcome{-1, ""};
-    FILE* pipe = popen(command.c_str(), "r");
-    std::array<char, 512> part;
-    while (std::fgets(part.data(), part.size(), pipe)) outcome.text += part.data();
-    const int status = pclose(pipe);
-    if (WIFEXITED(status)) outcome.code = WEXITSTATUS(status);
-    return outcome;
+  // What a run prints that ends well.
+  std::string RunWell(const std::string& arguments) const {
+    const Outcome outcome = Run(arguments);
+    EXPECT_EQ(outcome.code, 0) << arguments << "\n" << outcome.text;
+    return outcome.text;
+  }
+  // A run ends with that code and one line.
+  void ExpectLine(const std::string& arguments, int code, const std::string& part) const {
+    SCOPED_TRACE(arguments);
+    const Outcome outcome = Run(arguments);
+    EXPECT_EQ(outcome.code, code);
+    ExpectOneLine(outcome, part);
   }
 
   // A clip of the synthetic scene.
@@ -90,15 +83,9 @@ class ProgramTest : public ::testing::Test {
     WriteClip(Path(name), info, draw, settings);
   }
 
-  void MakeFile(const std::string& name, const std::string& content) const {
-    std::ofstream(Path(name)) << content;
-  }
-
-  std::vector<std::string> Files() const {
-    std::vector<std::string> names;
-    for (const auto& entry : fs::directory_iterator(folder_))
-      names.push_back(entry.path().filename());
-    std::sort(names.begin(), names.end());
+  std::set<std::string> Files() const {
+    std::set<std::string> names;
+    for (const auto& entry : fs::directory_iterator(path())) names.insert(entry.path().filename());
     return names;
   }
 
@@ -108,9 +95,6 @@ class ProgramTest : public ::testing::Test {
     EXPECT_EQ(std::count(outcome.text.begin(), outcome.text.end(), '\n'), 1) << outcome.text;
     EXPECT_THAT(outcome.text, HasSubstr(part));
   }
-
-  const ScratchFolder scratch_;
-  const fs::path folder_ = scratch_.path();
 };
 
 }  // namespace calmframe

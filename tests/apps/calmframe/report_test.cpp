@@ -1,7 +1,6 @@
-#include <cmath>
-#include <iterator>
 #include <nlohmann/json.hpp>
 #include <numbers>
+#include <regex>
 
 #include "tests/apps/calmframe/program_fixture.h"
 
@@ -41,11 +40,9 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
   const std::string clip = "a <wall> & 'more'.mp4";
   MakeWall(clip, Made(kWidth, kHeight, kFrames, 30), CameraAt);
   const std::string quoted = "\"" + clip + "\"";
-  ASSERT_EQ(Run("analyze " + quoted + " --project w.calm --quiet").code, 0);
+  RunWell("analyze " + quoted + " --project w.calm --quiet");
   const std::string saved = Content("w.calm");
-  const Outcome outcome = Run("report w.calm w.html --quiet");
-  ASSERT_EQ(outcome.code, 0) << outcome.text;
-  EXPECT_EQ(outcome.text, "");
+  EXPECT_EQ(RunWell("report w.calm w.html --quiet"), "");
   EXPECT_EQ(Content("w.calm"), saved);
   const std::string page = Content("w.html");
   EXPECT_THAT(page, HasSubstr("<h1>a &lt;wall&gt; &amp; &#39;more&#39;.mp4</h1>"));
@@ -85,9 +82,9 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
   for (const double share : Values(data, "empty", "uncovered")) EXPECT_LT(share, 0.1);
 
   // Without scaling the window's surroundings stay empty: what the window leaves of the frame.
-  ASSERT_EQ(Run("analyze " + quoted + " --project w.calm --framing crop --quiet").code, 0);
+  RunWell("analyze " + quoted + " --project w.calm --framing crop --quiet");
   EXPECT_EQ(Run("report w.calm w.html --quiet").code, 4) << "is there already";
-  ASSERT_EQ(Run("report w.calm w.html --quiet --overwrite").code, 0);
+  RunWell("report w.calm w.html --quiet --overwrite");
   const std::string cropped = Content("w.html");
   const std::size_t window = cropped.find("Crop window</th><td>");
   int width = 0, height = 0;
@@ -101,23 +98,20 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
 
 TEST_F(ReportTest, WithoutItsClipThePageHasAllButThePictures) {
   MakeClip("wide.mkv", 160, 120, 20, {64, 45});
-  const Outcome told = Run("analyze wide.mkv --project w.calm --quiet");
-  ASSERT_EQ(told.code, 0) << told.text;
-  ASSERT_EQ(Run("report w.calm with.html --quiet").code, 0);
+  const std::string told = RunWell("analyze wide.mkv --project w.calm --quiet");
+  RunWell("report w.calm with.html --quiet");
   fs::rename(Path("wide.mkv"), Path("elsewhere"));
-  const Outcome outcome = Run("report w.calm without.html --quiet");
-  EXPECT_EQ(outcome.code, 0);
-  ExpectOneLine(outcome, "wide.mkv is gone; the page has no pictures");
+  ExpectLine("report w.calm without.html --quiet", 0, "wide.mkv is gone; the page has no pictures");
   const std::string page = Content("without.html");
   EXPECT_THAT(page, HasSubstr("wide.mkv is gone; the page has no pictures</li>"));
   EXPECT_EQ(page.find("<img"), std::string::npos);
   EXPECT_EQ(DataOf(page), DataOf(Content("with.html")));
   // The result is told as analyze tells it.
-  const std::string crop = told.text.substr(told.text.find("crop window"));
+  const std::string crop = told.substr(told.find("crop window"));
   EXPECT_THAT(page, HasSubstr(crop.substr(0, crop.find('\n'))));
   // Another clip in its place is none of its pictures.
   MakeClip("wide.mkv", 160, 120, 6);
-  ExpectOneLine(Run("report w.calm other.html --quiet"), "is not the clip");
+  ExpectLine("report w.calm other.html --quiet", 0, "is not the clip");
   EXPECT_EQ(Content("other.html").find("<img"), std::string::npos);
 }
 
@@ -127,9 +121,8 @@ TEST_F(ReportTest, OfNothingNothingIsDrawn) {
     std::fill_n(pixels, 64 * 48, HX_Pixel8{255, 128, 128, 128});
   });
   for (const std::string name : {"one", "blank"}) {
-    ASSERT_EQ(Run("analyze " + name + ".mp4 --project " + name + ".calm --quiet").code, 0);
-    const Outcome outcome = Run("report " + name + ".calm " + name + ".html --quiet");
-    ASSERT_EQ(outcome.code, 0) << outcome.text;
+    RunWell("analyze " + name + ".mp4 --project " + name + ".calm --quiet");
+    RunWell("report " + name + ".calm " + name + ".html --quiet");
     const std::string page = Content(name + ".html");
     EXPECT_EQ(page.find("id=\"path-x\""), std::string::npos) << name;
     EXPECT_EQ(page.find(" nan"), std::string::npos) << name;
@@ -139,8 +132,8 @@ TEST_F(ReportTest, OfNothingNothingIsDrawn) {
 
 TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
   MakeClip("in.mp4", 160, 120, 20);
-  ASSERT_EQ(Run("analyze in.mp4 --project p.calm --quiet").code, 0);
-  ASSERT_EQ(Run("report p.calm p.html --quiet").code, 0);
+  RunWell("analyze in.mp4 --project p.calm --quiet");
+  RunWell("report p.calm p.html --quiet");
   // What the work came from is never written over, by no command and under no name.
   const std::string clip = Content("in.mp4"), saved = Content("p.calm");
   fs::create_hard_link(Path("in.mp4"), Path("same.mp4"));
@@ -155,15 +148,15 @@ TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
   const std::string page = Content("p.html");
   EXPECT_EQ(page.find("http:"), std::string::npos) << "nothing comes from elsewhere";
   EXPECT_EQ(page.find("https:"), std::string::npos);
-  if (std::system("command -v chromium >/dev/null") != 0) GTEST_SKIP() << "no chromium";
-  const std::string command =
-      "cd '" + folder_.string() +
+  if (Shell("command -v chromium").code != 0) GTEST_SKIP() << "no chromium";
+  const Outcome browser = Shell(
+      "cd '" + path().string() +
       "' && HOME=$PWD timeout 120 chromium --headless --no-sandbox "
       "--disable-gpu --disable-dev-shm-usage --user-data-dir=$PWD/profile --enable-logging=stderr "
-      "--virtual-time-budget=5000 --dump-dom \"file://$PWD/p.html\" >dom.html 2>log.txt";
-  ASSERT_EQ(std::system(command.c_str()), 0) << Content("log.txt");
+      "--virtual-time-budget=5000 --dump-dom \"file://$PWD/p.html\" 2>log.txt");
+  ASSERT_EQ(browser.code, 0) << Content("log.txt");
   EXPECT_EQ(Content("log.txt").find("CONSOLE"), std::string::npos) << Content("log.txt");
-  const std::string dom = Content("dom.html");
+  const std::string& dom = browser.text;
   // The script makes each plot it has found the data of answer to the keyboard.
   for (const char* plot :
        {"path-x", "path-y", "path-angle", "path-zoom", "tracks", "models", "crop", "empty"}) {
@@ -177,12 +170,8 @@ TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
     EXPECT_GE(std::count(path.begin(), path.end(), 'L'), 19) << plot;
     EXPECT_EQ(path.find("nan"), std::string::npos) << plot;
   }
-  std::size_t pictures = 0;
-  for (std::size_t at = 0;
-       (at = dom.find("src=\"data:image/jpeg;base64,", at)) != std::string::npos; ++at) {
-    ++pictures;
-  }
-  EXPECT_EQ(pictures, 12u);
+  const std::regex picture("src=\"data:image/jpeg;base64,");
+  EXPECT_EQ(std::distance(std::sregex_iterator(dom.begin(), dom.end(), picture), {}), 12);
 }
 
 }  // namespace

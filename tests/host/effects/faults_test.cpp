@@ -1,7 +1,6 @@
 // Plug-ins that misbehave.
 
 #include <stdexcept>
-#include <string>
 #include <vector>
 
 #include "platform/hx/hx_suites.h"
@@ -10,7 +9,7 @@
 namespace calmframe::host {
 namespace {
 
-class FaultsTest : public ProbeTest {
+class FaultsTest : public FrameProbe {
  protected:
   // An effect on a layer, and a frame by each path.
   void Play() {
@@ -19,18 +18,7 @@ class FaultsTest : public ProbeTest {
     direct = renderer->Direct({3}).result;
     planned = renderer->Planned({3}).result;
   }
-  static HX_Err WholeFrame(const Call& call) {
-    auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
-    plan.full_rect = plan.result_rect = plan.request.rect;
-    HX_CheckoutResult result;
-    return plan.checkout_layer(call.in->effect_ref, 0, 7, &plan.request, call.in->current_time,
-                               call.in->time_step, call.in->time_scale, &result);
-  }
-  static HX_Err FrameOfTheLayer(const Call& call) {
-    call.out->width = kClipWidth;
-    call.out->height = kClipHeight;
-    return HX_ERR_NONE;
-  }
+  static HX_Err Refuse(const Call&) { return 77; }
 
   CommandResult direct, planned;
 };
@@ -38,6 +26,7 @@ class FaultsTest : public ProbeTest {
 TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
   static const char* const kTexts[] = {"$$$/A=B", nullptr};
   static const HX_StringTable kTable = {2, 7, kTexts};
+  const auto usual = on;
   const struct {
     const char* told;
     std::uint32_t command;
@@ -49,31 +38,27 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
        [](const Call& call) { call.out->instance_handle = call.cb().new_handle(8); }},
       {"1 of world left\n", HX_CMD_RENDER_FRAME,
        [](const Call& call) {
-         With<HX_WorldSuite2>(call, HX_WORLD_SUITE, 2, [&](auto& worlds) {
-           HX_World world;
-           worlds.NewWorld(call.in->effect_ref, 3, 2, 1, HX_FORMAT_ARGB16, &world);
-         });
+         HX_World world;
+         call.Suite<HX_WorldSuite2>(HX_WORLD_SUITE, 2)
+             ->NewWorld(call.ref(), 3, 2, 1, HX_FORMAT_ARGB16, &world);
        }},
       {"1 of opaque data use left\n", HX_CMD_CREATE_INSTANCE,
        [](const Call& call) {
-         With<HX_OpaqueEffectDataSuite1>(call, HX_OPAQUE_EFFECT_DATA_SUITE, 1, [](auto& opaque) {
-           void* winner = nullptr;
-           opaque.Set(7, &winner, &winner);
-         });
+         void* winner = nullptr;
+         call.Suite<HX_OpaqueEffectDataSuite1>(HX_OPAQUE_EFFECT_DATA_SUITE, 1)
+             ->Set(7, &winner, &winner);
        }},
       {"1 of parameter checkout left\ncheckout_param: a frame was not checked in\n",
        HX_CMD_RENDER_FRAME,
        [](const Call& call) {
          HX_ParamDef input;
-         call.cb().checkout_param(call.in->effect_ref, 0, 0, 1, 25, &input);
+         call.cb().checkout_param(call.ref(), 0, 0, 1, 25, &input);
        }},
       {"-1 of parameter checkout left\ncheckin_param: a frame that is not checked out\n",
        HX_CMD_RENDER_FRAME,
-       [](const Call& call) { call.cb().checkin_param(call.in->effect_ref, call.params[0]); }},
+       [](const Call& call) { call.cb().checkin_param(call.ref(), call.params[0]); }},
       {"1 of direct render left\n", HX_CMD_RENDER_FRAME,
-       [](const Call& call) {
-         call.cb().utility(call.in->effect_ref, HX_UTILITY_BEGIN_RENDER, kTexts);
-       }},
+       [](const Call& call) { call.cb().utility(call.ref(), HX_UTILITY_BEGIN_RENDER, kTexts); }},
       {"1 of string table left\n", HX_CMD_START_PLUGIN,
        [](const Call& call) {
          std::uint64_t token = 0;
@@ -85,10 +70,9 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
        [](const Call& call) { call.cb().close_strings(99); }},
       {"1 of segments left\n", HX_CMD_CREATE_INSTANCE,
        [](const Call& call) {
-         With<HX_SequenceInfoSuite>(call, HX_SEQUENCE_INFO_SUITE, 3, [&](auto& sequence) {
-           HX_Segments segments = 0;
-           EXPECT_EQ(sequence.AcquireSegments(call.in->effect_ref, &segments), HX_ERR_NONE);
-         });
+         HX_Segments segments = 0;
+         const auto sequence = call.Suite<HX_SequenceInfoSuite>(HX_SEQUENCE_INFO_SUITE, 3);
+         EXPECT_EQ(sequence->AcquireSegments(call.ref(), &segments), HX_ERR_NONE);
        }},
       {"1 of suite HX World Suite left\n", HX_CMD_CREATE_INSTANCE,
        [](const Call& call) {
@@ -101,21 +85,21 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
       {"entry: an exception came out\n", HX_CMD_CREATE_INSTANCE,
        [](const Call&) { throw std::runtime_error("not caught"); }},
       {"plan.checkout_layer: one id for two times\n", HX_CMD_PLAN_FRAME,
-       [](const Call& call) {
+       [&](const Call& call) {
          call.in->current_time += call.in->time_step;
-         EXPECT_EQ(WholeFrame(call), HX_ERR_UNKNOWN);
+         EXPECT_EQ(usual.at(HX_CMD_PLAN_FRAME)(call), HX_ERR_UNKNOWN);
        }},
       {"render.checkout_layer_pixels: a frame was not checked in\n", HX_CMD_RENDER_PLANNED_FRAME,
        [](const Call& call) {
          HX_World* world = nullptr;
          const auto& render = *static_cast<HX_RenderExtra*>(call.extra);
-         EXPECT_EQ(render.checkout_layer_pixels(call.in->effect_ref, 7, &world), HX_ERR_NONE);
-         EXPECT_NE(render.checkout_layer_pixels(call.in->effect_ref, 8, &world), HX_ERR_NONE);
+         EXPECT_EQ(render.checkout_layer_pixels(call.ref(), 0, &world), HX_ERR_NONE);
+         EXPECT_NE(render.checkout_layer_pixels(call.ref(), 8, &world), HX_ERR_NONE);
        }},
       {"render.checkin_layer_pixels: a frame that is not checked out\n",
        HX_CMD_RENDER_PLANNED_FRAME,
        [](const Call& call) {
-         static_cast<HX_RenderExtra*>(call.extra)->checkin_layer_pixels(call.in->effect_ref, 7);
+         static_cast<HX_RenderExtra*>(call.extra)->checkin_layer_pixels(call.ref(), 0);
        }},
       {"output: written behind its rows\n", HX_CMD_RENDER_FRAME,
        [](const Call& call) {
@@ -124,9 +108,9 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
   };
   for (const auto& misdeed : misdeeds) {
     SCOPED_TRACE(misdeed.told);
-    on = {{HX_CMD_PREPARE_FRAME, FrameOfTheLayer}, {HX_CMD_PLAN_FRAME, WholeFrame}};
-    on[misdeed.command] = [&, usual = on[misdeed.command]](const Call& call) -> HX_Err {
-      const HX_Err code = usual ? usual(call) : HX_ERR_NONE;
+    on = usual;
+    on[misdeed.command] = [&, deed = on[misdeed.command]](const Call& call) -> HX_Err {
+      const HX_Err code = deed ? deed(call) : HX_ERR_NONE;
       misdeed.deed(call);
       return code;
     };
@@ -137,7 +121,6 @@ TEST_F(FaultsTest, WhatAPlugInKeepsOrDoesWrongIsTold) {
 }
 
 TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
-  const auto refuse = [](const Call&) { return 77; };
   const auto say = [](const Call& call) {
     call.out->out_flags |= HX_OUT_FLAG_SHOW_MESSAGE;
     call.cb().copy_text(call.out->return_msg, HX_RETURN_MSG_SIZE, "No room.");
@@ -157,7 +140,7 @@ TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
   const struct {
     Deed prepare, plan;
     std::string line;
-  } cases[] = {{refuse, refuse, "it: the plug-in answered 77"},
+  } cases[] = {{Refuse, Refuse, "it: the plug-in answered 77"},
                {say, say, "it: No room."},
                {grow, exceed, "it: the plug-in answered " + std::to_string(HX_ERR_UNKNOWN)}};
   for (const auto& c : cases) {
@@ -171,7 +154,6 @@ TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
 }
 
 TEST_F(FaultsTest, AStartThatFailsIsToldAndLeavesNothing) {
-  const auto refuse = [](const Call&) { return 77; };
   const auto miscount = [](const Call& call) -> HX_Err {
     call.out->num_params = 3;
     return HX_ERR_NONE;
@@ -184,19 +166,14 @@ TEST_F(FaultsTest, AStartThatFailsIsToldAndLeavesNothing) {
     Deed deed;
     std::string told;
   } cases[] = {
-      {HX_CMD_START_PLUGIN, refuse, "Probe: the plug-in answered 77"},
+      {HX_CMD_START_PLUGIN, Refuse, "Probe: the plug-in answered 77"},
       {HX_CMD_START_PLUGIN, make, "Probe: the plug-in answered " + std::to_string(HX_ERR_MEMORY)},
-      {HX_CMD_DECLARE_PARAMS, refuse, "Probe: the plug-in answered 77"},
+      {HX_CMD_DECLARE_PARAMS, Refuse, "Probe: the plug-in answered 77"},
       {HX_CMD_DECLARE_PARAMS, miscount, "Probe: tells of 3 parameters and declares 1"}};
   Operations::Get().FailAlways("new_handle");
   for (const auto& c : cases) {
     on = {{c.command, c.deed}};
-    try {
-      Start();
-      ADD_FAILURE() << "it was started";
-    } catch (const PluginError& error) {
-      EXPECT_EQ(error.what(), c.told);
-    }
+    EXPECT_THAT([&] { Start(); }, testing::ThrowsMessage<PluginError>(c.told));
     EXPECT_EQ(Host::active(), nullptr);
     EXPECT_EQ(Ledger::Get().Report(), "");
   }
@@ -211,13 +188,11 @@ TEST_F(FaultsTest, TextsAreCutBetweenCharacters) {
     std::uint16_t name[6] = {7, 7, 7, 7, 7, 7};
     const std::uint16_t film[] = {u'a', 0xD83C, 0xDFA5, 0};
     char bytes[5] = {};
-    With<HX_UtilitySuite>(call, HX_UTILITY_SUITE, 5, [&](auto& utility) {
-      EXPECT_EQ(utility.GetLayerName(call.in->effect_ref, name, 5), HX_ERR_NONE);
-    });
+    const auto utility = call.Suite<HX_UtilitySuite>(HX_UTILITY_SUITE, 5);
+    EXPECT_EQ(utility->GetLayerName(call.ref(), name, 5), HX_ERR_NONE);
     EXPECT_EQ(std::vector(name, name + 6), (std::vector<std::uint16_t>{'a', 'b', 'c', 0, 7, 7}));
-    With<HX_PrivateEffectSuite3>(call, HX_PRIVATE_EFFECT_SUITE, 3, [&](auto& own) {
-      EXPECT_EQ(own.ConvertText(film, bytes, 5), HX_ERR_NONE);
-    });
+    const auto own = call.Suite<HX_PrivateEffectSuite3>(HX_PRIVATE_EFFECT_SUITE, 3);
+    EXPECT_EQ(own->ConvertText(film, bytes, 5), HX_ERR_NONE);
     EXPECT_STREQ(bytes, "a");
     return 33;
   };

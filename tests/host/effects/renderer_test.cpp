@@ -2,7 +2,6 @@
 
 #include <array>
 #include <cmath>
-#include <vector>
 
 #include "host/pixels/world_operations.h"
 #include "tests/host/effects/probe_test.h"
@@ -32,63 +31,10 @@ Rgb At(const WorldBuffer& buffer, int x, int y) {
   return rgb;
 }
 
-// An effect that shows its input, or another frame, in the middle of an output that may be larger.
-class RendererTest : public ProbeTest {
+class RendererTest : public FrameProbe {
  protected:
-  RendererTest() {
-    on[HX_CMD_PREPARE_FRAME] = [this](const Call& call) -> HX_Err {
-      call.out->width = call.params[0]->u.ld.width + 2 * margin;
-      call.out->height = call.params[0]->u.ld.height + 2 * margin;
-      call.out->origin_x = call.out->origin_y = margin;
-      return HX_ERR_NONE;
-    };
-    on[HX_CMD_RENDER_FRAME] = [this](const Call& call) -> HX_Err {
-      if (offset == 0) return Draw(call, call.params[0]->u.ld, call.output);
-      HX_ParamDef input{};
-      const HX_InData& in = *call.in;
-      const std::int32_t time = in.current_time + offset * in.time_step;
-      if (const HX_Err code = call.cb().checkout_param(in.effect_ref, 0, time, in.time_step,
-                                                       in.time_scale, &input)) {
-        return code;
-      }
-      const HX_Err code = Draw(call, input.u.ld, call.output);
-      call.cb().checkin_param(in.effect_ref, &input);
-      return code;
-    };
-    on[HX_CMD_PLAN_FRAME] = [this](const Call& call) -> HX_Err {
-      auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
-      const HX_InData& in = *call.in;
-      HX_CheckoutResult results[3];
-      // Twice each: the second order widens the first.
-      for (const HX_Rect& wanted : {HX_Rect{1, 1, 2, 2}, HX_Rect{0, 0, 1 << 15, 1 << 15}}) {
-        for (const int id : {-1, 0, 1}) {
-          const HX_RenderRequest request{wanted, plan.request.bit_depth};
-          const std::int32_t time = in.current_time + id * in.time_step;
-          if (const HX_Err code =
-                  plan.checkout_layer(in.effect_ref, 0, id, &request, time, in.time_step,
-                                      in.time_scale, &results[1 + id])) {
-            return code;
-          }
-        }
-      }
-      const HX_Rect& rect = results[1].full_rect;
-      plan.full_rect = {rect.left - margin, rect.top - margin, rect.right + margin,
-                        rect.bottom + margin};
-      plan.result_rect = plan.full_rect;
-      plan.may_exceed = margin > 0;
-      return HX_ERR_NONE;
-    };
-    on[HX_CMD_RENDER_PLANNED_FRAME] = [this](const Call& call) -> HX_Err {
-      const auto& render = *static_cast<HX_RenderExtra*>(call.extra);
-      HX_World *output = nullptr, *input = nullptr;
-      render.checkout_output(call.in->effect_ref, &output);
-      if (const HX_Err code = render.checkout_layer_pixels(call.in->effect_ref, offset, &input)) {
-        return code;
-      }
-      const HX_Err code = Draw(call, *input, output);
-      render.checkin_layer_pixels(call.in->effect_ref, offset);
-      return code;
-    };
+  RendererTest() { Begin(); }
+  void Begin() {
     Start();
     effect = &session->Apply(MakeDrawnLayer());
     renderer = effect->MakeRenderer();
@@ -98,17 +44,10 @@ class RendererTest : public ProbeTest {
     ProbeTest::TearDown();
   }
 
-  // Layer (0, 0) of `from` lies at its origin; so it does in `to`.
-  static HX_Err Draw(const Call& call, const HX_World& from, HX_World* to) {
-    const std::int32_t x = from.origin_x - to->origin_x, y = from.origin_y - to->origin_y;
-    const HX_Rect place = {x, y, x + from.width, y + from.height};
-    return call.cb().copy_world(call.in->effect_ref, &from, to, nullptr, &place);
-  }
   RenderedFrame Render(bool direct, const RenderRequest& request) {
     return direct ? renderer->Direct(request) : renderer->Planned(request);
   }
 
-  int margin = 0, offset = 0;  // pixels on each side; frames
   Effect* effect = nullptr;
   std::unique_ptr<Renderer> renderer;
 };
@@ -210,18 +149,14 @@ TEST_F(RendererTest, ParametersStayAsTheyWereWhenTheRenderBegan) {
     const HX_InData& in = *call.in;
     HX_ParamDef amount = *call.params[1];
     amount.u.fs.value += 1;
-    With<HX_ParamUtilsSuite3>(call, HX_PARAM_UTILS_SUITE, 3, [&](const HX_ParamUtilsSuite3& utils) {
-      EXPECT_EQ(utils.SetParamValue(in.effect_ref, 1, &amount), HX_ERR_NONE);
-    });
-    call.cb().checkout_param(in.effect_ref, 1, in.current_time, in.time_step, in.time_scale,
-                             &amount);
+    const auto utils = call.Suite<HX_ParamUtilsSuite3>(HX_PARAM_UTILS_SUITE, 3);
+    EXPECT_EQ(utils->SetParamValue(call.ref(), 1, &amount), HX_ERR_NONE);
+    call.cb().checkout_param(call.ref(), 1, in.current_time, in.time_step, in.time_scale, &amount);
     seen.push_back(amount.u.fs.value);
-    call.cb().checkin_param(in.effect_ref, &amount);
+    call.cb().checkin_param(call.ref(), &amount);
     return HX_ERR_NONE;
   };
-  Start();
-  effect = &session->Apply(MakeDrawnLayer());
-  renderer = effect->MakeRenderer();
+  Begin();
   for (const bool direct : {true, false}) Render(direct, {1});
   EXPECT_EQ(seen, (std::vector<double>{5, 6}));
 }

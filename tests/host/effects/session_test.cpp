@@ -1,11 +1,8 @@
 #include "host/effects/session.h"
 
-#include <gmock/gmock.h>
-
 #include <deque>
 #include <thread>
 #include <utility>
-#include <vector>
 
 #include "tests/host/effects/probe_test.h"
 
@@ -35,15 +32,11 @@ class SessionTest : public ProbeTest {
       call.out->num_params = 4;
       return HX_ERR_NONE;
     };
-    on[HX_CMD_CREATE_INSTANCE] = [](const Call& call) { return NewInstance(call, 0); };
-    on[HX_CMD_FLATTEN_INSTANCE] = [](const Call& call) { return NewInstance(call, 1); };
-    on[HX_CMD_RESTORE_INSTANCE] = [](const Call& call) -> HX_Err {
-      if (const HX_Handle old = call.in->instance_handle) {
-        const auto* bytes = static_cast<const std::uint8_t*>(call.cb().lock_handle(old));
-        const bool whole = call.cb().handle_size(old) == 2 && bytes[1] == 1;
-        call.cb().unlock_handle(old);
-        if (!whole) return 77;
-      }
+    on[HX_CMD_CREATE_INSTANCE] = [this](const Call& call) { return NewInstance(call, 0); };
+    on[HX_CMD_FLATTEN_INSTANCE] = [this](const Call& call) { return NewInstance(call, 1); };
+    on[HX_CMD_RESTORE_INSTANCE] = [this](const Call& call) -> HX_Err {
+      const HX_Handle old = call.in->instance_handle;
+      if (old && host->handles().BytesOf(old) != std::vector<std::uint8_t>{0, 1}) return 77;
       return NewInstance(call, 0);
     };
     on[HX_CMD_DESTROY_INSTANCE] = [](const Call& call) -> HX_Err {
@@ -61,12 +54,9 @@ class SessionTest : public ProbeTest {
     Start();
   }
 
-  static HX_Err NewInstance(const Call& call, std::uint8_t flat) {
-    const HX_Handle handle = call.cb().new_handle(2);
-    static_cast<std::uint8_t*>(call.cb().lock_handle(handle))[1] = flat;
-    call.cb().unlock_handle(handle);
+  HX_Err NewInstance(const Call& call, std::uint8_t flat) {
     if (call.in->instance_handle) call.cb().dispose_handle(call.in->instance_handle);
-    call.in->instance_handle = call.out->instance_handle = handle;
+    call.in->instance_handle = call.out->instance_handle = host->handles().NewFrom({0, flat});
     return HX_ERR_NONE;
   }
 

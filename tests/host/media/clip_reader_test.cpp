@@ -1,4 +1,3 @@
-#include <algorithm>
 #include <random>
 
 #include "tests/host/media/clip_fixture.h"
@@ -6,27 +5,14 @@
 namespace calmframe::media {
 namespace {
 
-using Frame = std::vector<HX_Pixel8>;
-
 class ClipReaderTest : public ClipTest {
  protected:
   // B-frames and short groups, and the counter in testsrc makes each frame its own.
-  void MakeWalk(const std::string& name, const std::string& more = "") const {
-    Ffmpeg("-f lavfi -i testsrc=s=96x64:r=30:d=2 -c:v libx264 -x264-params keyint=12:bframes=3" +
-           more + " -pix_fmt yuv420p -movflags +faststart " + In(name));
-  }
-  void WriteFile(const std::string& name, const std::string& bytes) const {
-    std::ofstream(In(name), std::ios::binary) << bytes;
-  }
-  static Frame Read(ClipReader& reader, std::size_t frame) {
-    return ReadFrame<HX_Pixel8>(reader, frame);
-  }
-  // Until all are read or one can't be.
-  static void ReadAll(ClipReader& reader) {
-    try {
-      for (std::size_t i = 0; i < reader.info().frame_count; ++i) Read(reader, i);
-    } catch (const Failure&) {
-    }
+  void MakeWalk(const std::string& name) const {
+    Ffmpeg(
+        "-f lavfi -i testsrc=s=96x64:r=30:d=2 -c:v libx264 -x264-params keyint=12:bframes=3 "
+        "-pix_fmt yuv420p -movflags +faststart " +
+        In(name));
   }
 };
 
@@ -63,10 +49,10 @@ TEST_F(ClipReaderTest, EachWayInAndAnyOrderGivesTheFramesThatTheSequenceGives) {
     EXPECT_EQ(found->standing(), clip.promises ? Standing::promised : Standing::decoded);
     EXPECT_EQ(found->Bytes().empty(), clip.promises);
     EXPECT_EQ(promised->info(), info);
-    std::vector<Frame> frames;
+    std::vector<std::vector<HX_Pixel8>> frames;
     for (std::size_t i = 0; i < clip.frames; ++i) {
-      frames.push_back(Read(*reader, i));
-      EXPECT_TRUE(SamePixels(Read(*promised, i), frames[i])) << i;
+      frames.push_back(ReadFrame(*reader, i));
+      EXPECT_TRUE(SamePixels(ReadFrame(*promised, i), frames[i])) << i;
       EXPECT_TRUE(i == 0 || !SamePixels(frames[i - 1], frames[i])) << i;
     }
     EXPECT_EQ(found->standing(), Standing::decoded);
@@ -78,12 +64,12 @@ TEST_F(ClipReaderTest, EachWayInAndAnyOrderGivesTheFramesThatTheSequenceGives) {
     for (int i = 0; i < 30; ++i) {
       const std::size_t frame = random() % (clip.frames - 1);
       ClipReader& one = *(i % 3 == 0 ? reader : i % 3 == 1 ? promised : known);
-      EXPECT_TRUE(SamePixels(Read(one, frame), frames[frame])) << frame;
+      EXPECT_TRUE(SamePixels(ReadFrame(one, frame), frames[frame])) << frame;
       if (i % 2 == 0) {
-        EXPECT_TRUE(SamePixels(Read(one, frame + 1), frames[frame + 1])) << frame;
+        EXPECT_TRUE(SamePixels(ReadFrame(one, frame + 1), frames[frame + 1])) << frame;
       }
     }
-    Read(*ClipReader::Open(In(clip.name)), 0);  // and dropped while it decodes ahead
+    ReadFrame(*ClipReader::Open(In(clip.name)), 0);  // and dropped while it decodes ahead
   }
 }
 
@@ -91,7 +77,7 @@ TEST_F(ClipReaderTest, AnyOrderIsRightWhileFramesAreStillPromised) {
   MakeWalk("a.mp4");
   const auto decoded = ClipReader::Open(In("a.mp4"));
   const auto expect = [&](ClipReader& reader, std::size_t frame) {
-    EXPECT_TRUE(SamePixels(Read(reader, frame), Read(*decoded, frame))) << frame;
+    EXPECT_TRUE(SamePixels(ReadFrame(reader, frame), ReadFrame(*decoded, frame))) << frame;
   };
   for (const std::size_t jump : {0, 1, 5, 12, 40, 59}) {
     SCOPED_TRACE(jump);
@@ -112,23 +98,23 @@ TEST_F(ClipReaderTest, AnyOrderIsRightWhileFramesAreStillPromised) {
       EXPECT_EQ((*reader)->found()->Bytes(), decoded->found()->Bytes());
     }
   }
-  Read(*ClipReader::OpenPromised(In("a.mp4")), 0);
+  ReadFrame(*ClipReader::OpenPromised(In("a.mp4")), 0);
 }
 
 TEST_F(ClipReaderTest, WhatIsCutShortGivesWhatDecodesAndIsTold) {
   MakeWalk("whole.mp4");
   const std::string whole = Content("whole.mp4");
   const auto found = ClipReader::Open(In("whole.mp4"))->found()->Bytes();
-  WriteFile("cut.mp4", whole.substr(0, whole.size() * 6 / 10));
+  MakeFile("cut.mp4", whole.substr(0, whole.size() * 6 / 10));
   const auto cut = ClipReader::Open(In("cut.mp4"));
   const std::size_t count = cut->info().frame_count;
   EXPECT_GT(count, 12u);
   EXPECT_LT(count, 55u);
   EXPECT_EQ(cut->info().warning, In("cut.mp4") + ": damaged or cut short, " +
                                      std::to_string(count) + " of 60 frames decode");
-  for (std::size_t i = count; i-- > 0;) Read(*cut, i);
+  for (std::size_t i = count; i-- > 0;) ReadFrame(*cut, i);
   // A search meets the damage; who knows the clip doesn't search.
-  WriteFile("whole.mp4", whole.substr(0, whole.size() / 2) + std::string(whole.size() / 2, 'x'));
+  MakeFile("whole.mp4", whole.substr(0, whole.size() / 2) + std::string(whole.size() / 2, 'x'));
   EXPECT_NE(ClipReader::Open(In("whole.mp4"))->info().warning, "");
   EXPECT_EQ(ClipReader::Open(In("whole.mp4"), found)->info().warning, "");
 }
@@ -142,21 +128,24 @@ TEST_F(ClipReaderTest, DamageAnywhereIsToldOrBreaksThePromiseInEveryRun) {
     std::mt19937 random(number);
     std::string bytes = whole;
     for (unsigned i = random() % 3 + 1; i-- > 0;) bytes[random() % bytes.size()] ^= 0x10;
-    WriteFile("a.mp4", bytes);
+    MakeFile("a.mp4", bytes);
     std::unique_ptr<ClipReader> decoded;
     try {
       decoded = ClipReader::Open(In("a.mp4"));
     } catch (const Failure& failure) {
-      EXPECT_EQ(LineOf(Failure::Side::input, [&] { ClipReader::OpenPromised(In("a.mp4")); }),
-                failure.what());
+      EXPECT_THAT([&] { ClipReader::OpenPromised(In("a.mp4")); },
+                  Fails(Failure::Side::input, failure.what()));
       continue;
     }
     const auto promised = ClipReader::OpenPromised(In("a.mp4"));
-    ReadAll(*promised);
+    try {  // until one can't be read
+      for (std::size_t i = 0; i < promised->info().frame_count; ++i) ReadFrame(*promised, i);
+    } catch (const Failure&) {
+    }
     if (promised->found()->standing() == Standing::broken) {
       ++broken;
-      LineOf(Failure::Side::input, [&] { promised->Again(); });
-      LineOf(Failure::Side::input, [&] { Read(*promised, 0); });
+      EXPECT_THAT([&] { promised->Again(); }, Fails(Failure::Side::input, testing::_));
+      EXPECT_THAT([&] { ReadFrame(*promised, 0); }, Fails(Failure::Side::input, testing::_));
       continue;
     }
     EXPECT_EQ(promised->found()->standing(), Standing::decoded);
@@ -172,9 +161,9 @@ TEST_F(ClipReaderTest, AFrameInTwoPacketsIsOneFrame) {
   EXPECT_EQ(van->info().frame_count, 36u);
   EXPECT_EQ(van->info().field_order, FieldOrder::top_first);
   EXPECT_EQ(van->info().frame_rate.num, 25 * van->info().frame_rate.den);
-  const Frame last = Read(*van, 35), middle = Read(*van, 17);
+  const auto last = ReadFrame(*van, 35), middle = ReadFrame(*van, 17);
   for (const std::size_t i : {0, 16, 17, 18, 34, 35}) {
-    const Frame frame = Read(*van, i);
+    const auto frame = ReadFrame(*van, i);
     EXPECT_EQ(SamePixels(frame, middle), i == 17);
     EXPECT_EQ(SamePixels(frame, last), i == 35);
   }

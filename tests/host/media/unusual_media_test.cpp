@@ -1,8 +1,9 @@
 // Sound clips that are unlike most: each gives the frames, times and pixels that the ffmpeg program
 // decodes from it.
 
-#include <array>
 #include <cmath>
+#include <iterator>
+#include <sstream>
 
 #include "host/media/frame_index.h"
 #include "tests/host/media/clip_fixture.h"
@@ -14,15 +15,11 @@ class UnusualMediaTest : public ClipTest {
  protected:
   // Seconds of the frames, in the order shown.
   static std::vector<double> TimesOf(const std::string& path) {
-    std::istringstream lines(Output(
+    std::istringstream times(Output(
         "ffprobe -v error -select_streams V:0 -show_entries frame=best_effort_timestamp_time "
-        "-of csv=p=0 '" +
+        "-of default=nk=1:nw=1 '" +
         path + "'"));
-    std::vector<double> times;
-    for (std::string line; std::getline(lines, line);) {
-      if (!line.empty()) times.push_back(std::stod(line));
-    }
-    return times;
+    return {std::istream_iterator<double>(times), {}};
   }
 
   // Times of a clip's frames against those of the ffmpeg program, and its pixels against those that
@@ -39,7 +36,7 @@ class UnusualMediaTest : public ClipTest {
     ASSERT_EQ(decoded.size(), 4 * plane * frames);
     for (std::size_t i = frames; i-- > 0;) {
       EXPECT_NEAR(static_cast<double>(info.times[i].pts) * tick, times[i], 1e-5) << i;
-      const auto pixels = ReadFrame<HX_Pixel8>(*reader, i);
+      const auto pixels = ReadFrame(*reader, i);
       const auto* green = reinterpret_cast<const std::uint8_t*>(decoded.data()) + 4 * plane * i;
       int sum = 0;
       for (std::size_t k = 0; k < plane; ++k) {
@@ -55,13 +52,13 @@ class UnusualMediaTest : public ClipTest {
 // All are made by one run of the ffmpeg program, and decoded by another.
 TEST_F(UnusualMediaTest, FramesTimesAndPixelsAreTheFilesOwn) {
   const std::string folder = "cd '" + In("") + "' && ffmpeg -nostdin -y -v error ";
+  const std::string alpha = "-vf format=rgba,colorchannelmixer=ar=0.7:aa=0.2 -frames:v 3 -c:v ";
   const struct {
     std::string name, make;
     std::size_t frames;
   } clips[] = {
       {"one.mp4", "-frames:v 1 -c:v libx264", 1},
       {"two.mp4", "-frames:v 2 -c:v libx264 -bf 2", 2},
-      {"three.mkv", "-frames:v 3 -c:v libx264 -bf 2", 3},
       {"gaps.mkv", "-vf 'setpts=N+20*floor(N/4)' -vsync passthrough -c:v ffv1", 25},
       {"vfr.mp4", "-vf select='mod(n\\,5)' -vsync vfr -c:v libx264", 20},
       {"late.ts", "-c:v libx264 -bf 2 -output_ts_offset 5000", 25},
@@ -69,14 +66,10 @@ TEST_F(UnusualMediaTest, FramesTimesAndPixelsAreTheFilesOwn) {
       {"edited.mp4", "-map 1 -c:v libx264 -bf 2 -c:a aac", 12},
       {"attached.mkv", "-c:v libx264 -attach cover.png -metadata:s:t mimetype=image/png", 25},
       {"streams.mkv", "-map 2 -map 1 -c:v ffv1 -c:a flac -disposition:v:0 default", 25},
-      {"alpha.mov", "-vf format=rgba,colorchannelmixer=ar=0.7:aa=0.2 -frames:v 3 -c:v qtrle", 3},
-      {"alpha.mkv",
-       "-vf format=rgba,colorchannelmixer=ar=0.7:aa=0.2 -frames:v 3 -c:v ffv1 -pix_fmt yuva444p",
-       3},
+      {"alpha.mov", alpha + "qtrle", 3},
+      {"alpha.mkv", alpha + "ffv1 -pix_fmt yuva444p", 3},
       {"open.mp4",
-       "-c:v libx265 -x265-params log-level=none:keyint=6:open-gop=1:bframes=3 "
-       "-pix_fmt yuv420p10le",
-       25},
+       "-pix_fmt yuv420p10le -c:v libx265 -x265-params log-level=none:keyint=6:open-gop=1", 25},
       {"still.avi", "-frames:v 3 -c:v mjpeg -pix_fmt yuvj422p", 3},
       {"vp9.webm", "-frames:v 5 -c:v libvpx-vp9 -deadline realtime -cpu-used 8", 5},
       {"palette.gif", "-frames:v 4 -vf split[a][b],[a]palettegen[p],[b][p]paletteuse", 4},
@@ -113,18 +106,13 @@ TEST_F(UnusualMediaTest, FramesTimesAndPixelsAreTheFilesOwn) {
 TEST_F(UnusualMediaTest, EveryTurnAndMirrorImage) {
   Ffmpeg("-f lavfi -i testsrc=s=64x32:r=25:d=0.1,setsar=2/1 -c:v libx264rgb -qp 0 " +
          In("flat.mp4"));
-  const auto flat = ReadFrame<HX_Pixel8>(*ClipReader::Open(In("flat.mp4")), 1);
+  const auto flat = ReadFrame(*ClipReader::Open(In("flat.mp4")), 1);
   const std::string bytes = Content("flat.mp4");
   const std::size_t matrix = bytes.find("tkhd") + 44;
-  for (const auto& [a, b, c, d] : {std::array{1, 0, 0, 1},
-                                   {0, 1, -1, 0},
-                                   {-1, 0, 0, -1},
-                                   {0, -1, 1, 0},
-                                   {-1, 0, 0, 1},
-                                   {1, 0, 0, -1},
-                                   {0, 1, 1, 0},
-                                   {0, -1, -1, 0}}) {
-    SCOPED_TRACE(::testing::PrintToString(std::array{a, b, c, d}));
+  constexpr int kMatrices[][4] = {{1, 0, 0, 1},  {0, 1, -1, 0}, {-1, 0, 0, -1}, {0, -1, 1, 0},
+                                  {-1, 0, 0, 1}, {1, 0, 0, -1}, {0, 1, 1, 0},   {0, -1, -1, 0}};
+  for (const auto& [a, b, c, d] : kMatrices) {
+    SCOPED_TRACE(testing::Message() << a << " " << b << " " << c << " " << d);
     std::string turned = bytes;
     const int entries[] = {a, b, 0, c, d};  // 16.16, big-endian
     for (std::size_t i = 0; i < 5; ++i) {
@@ -132,13 +120,13 @@ TEST_F(UnusualMediaTest, EveryTurnAndMirrorImage) {
       turned[matrix + 4 * i + 1] = static_cast<char>(entries[i]);
       turned[matrix + 4 * i + 2] = turned[matrix + 4 * i + 3] = 0;
     }
-    std::ofstream(In("turned.mp4"), std::ios::binary) << turned;
+    MakeFile("turned.mp4", turned);
     const auto reader = ClipReader::Open(In("turned.mp4"));
     const int width = a != 0 ? 64 : 32;
     ASSERT_EQ(reader->info().width, width);
     const Ratio aspect = reader->info().pixel_aspect;
     EXPECT_EQ(aspect.num * (a != 0 ? 1 : 2), aspect.den * (a != 0 ? 2 : 1));
-    const auto shown = ReadFrame<HX_Pixel8>(*reader, 1);
+    const auto shown = ReadFrame(*reader, 1);
     int wrong = 0;
     for (int y = 0; y < 32; ++y) {
       for (int x = 0; x < 64; ++x) {
@@ -171,13 +159,13 @@ TEST_F(UnusualMediaTest, FieldsInBothOrders) {
 TEST_F(UnusualMediaTest, SizeThatChangesOnTheWayIsThatOfTheFirstFrame) {
   Ffmpeg("-f lavfi -i testsrc=s=64x48:r=25:d=0.4 -c:v libx264 " + In("a.ts"));
   Ffmpeg("-f lavfi -i testsrc=s=96x80:r=25:d=0.4 -c:v libx264 -pix_fmt yuv444p " + In("b.ts"));
-  std::ofstream(In("c.ts"), std::ios::binary) << Content("a.ts") << Content("b.ts");
+  MakeFile("c.ts", Content("a.ts") + Content("b.ts"));
   const auto reader = ClipReader::Open(In("c.ts"));
   ASSERT_EQ(reader->info().frame_count, 20u);
   EXPECT_EQ(reader->info().width, 64);
-  const auto last = ReadFrame<HX_Pixel8>(*reader, 19);
+  const auto last = ReadFrame(*reader, 19);
   Ffmpeg("-i " + In("b.ts") + " -vf scale=64:48:flags=bicubic -c:v ffv1 " + In("d.mkv"));
-  const auto expected = ReadFrame<HX_Pixel8>(*ClipReader::Open(In("d.mkv")), 9);
+  const auto expected = ReadFrame(*ClipReader::Open(In("d.mkv")), 9);
   double sum = 0;
   for (std::size_t i = 0; i < last.size(); ++i) sum += std::abs(last[i].green - expected[i].green);
   EXPECT_LT(sum / static_cast<double>(last.size()), 4);
@@ -202,18 +190,19 @@ TEST_F(UnusualMediaTest, TimesBeyondAnyClockAreNone) {
 TEST_F(UnusualMediaTest, WhatIsTooMuchIsRefusedInOneLine) {
   Ffmpeg("-f lavfi -i testsrc=s=64x48:r=25:d=0.4 -c:v mpeg4 " + In("many.avi"));
   ClipInfo info;
-  EXPECT_EQ(LineOf(Failure::Side::input, [&] { ScanFrames(In("many.avi"), info, 9); }),
-            In("many.avi") + ": more than 9 frames");
+  EXPECT_THAT([&] { ScanFrames(In("many.avi"), info, 9); },
+              Fails(Failure::Side::input, In("many.avi") + ": more than 9 frames"));
   EXPECT_EQ(ScanFrames(In("many.avi"), info, 10).size(), 10u);
 
   Ffmpeg("-f lavfi -i color=s=7680x4320 -frames:v 1 -c:v mjpeg " + In("8k.mov"));
   EXPECT_EQ(ClipReader::Open(In("8k.mov"))->info().width, 7680);
-  std::ofstream(In("huge.y4m")) << "YUV4MPEG2 W16000 H16000 F25:1 Ip A1:1 C420jpeg\nFRAME\n";
-  EXPECT_NE(LineOf(Failure::Side::input, [&] { ClipReader::Open(In("huge.y4m")); })
-                .find("16000 x 16000 pixels are too large"),
-            std::string::npos);
+  MakeFile("huge.y4m", "YUV4MPEG2 W16000 H16000 F25:1 Ip A1:1 C420jpeg\nFRAME\n");
+  EXPECT_THAT(
+      [&] { ClipReader::Open(In("huge.y4m")); },
+      Fails(Failure::Side::input, testing::HasSubstr("16000 x 16000 pixels are too large")));
   Ffmpeg("-f lavfi -i sine=d=1 " + In("sound.wav"));
-  EXPECT_NE(LineOf(Failure::Side::input, [&] { ClipReader::Open(In("sound.wav")); }), "");
+  EXPECT_THAT([&] { ClipReader::Open(In("sound.wav")); },
+              Fails(Failure::Side::input, testing::Ne("")));
 }
 
 }  // namespace

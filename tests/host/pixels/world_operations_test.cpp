@@ -73,15 +73,14 @@ void Fill(WorldBuffer& buffer, unsigned seed, bool wild = false) {
 
 // s in front of d, in the floats of the formula.
 Colour InFront(const Colour& s, const Colour& d, float opacity_s, float opacity_d) {
-  float front[4], back[4];
-  std::copy(s.begin(), s.end(), front);
-  std::copy(d.begin(), d.end(), back);
-  front[0] *= opacity_s;
-  back[0] *= opacity_d;
-  const float behind = back[0] * (1.0f - front[0]), alpha = front[0] + behind;
+  const float front = static_cast<float>(s[0]) * opacity_s;
+  const float behind = static_cast<float>(d[0]) * opacity_d * (1.0f - front);
+  const float alpha = front + behind;
   if (!(alpha > 0)) return {};
   Colour result{alpha};
-  for (int c = 1; c < 4; ++c) result[c] = (front[c] * front[0] + back[c] * behind) / alpha;
+  for (int c = 1; c < 4; ++c) {
+    result[c] = (static_cast<float>(s[c]) * front + static_cast<float>(d[c]) * behind) / alpha;
+  }
   return result;
 }
 
@@ -152,13 +151,11 @@ TEST(CopyWorld, ConvertsThereAndBackWithoutLoss) {
     CopyWorld(other.world(), back.world(), nullptr, nullptr);
     for (int i = 0; i < 256; ++i) ASSERT_EQ(Get(back, i, 0), Get(bytes, i, 0)) << format;
   }
-  const float wild[] = {7.5f, -1.0f, NAN};
-  const int clamped[] = {32768, 0, 0};
-  for (int i = 0; i < 3; ++i) {
+  for (const auto& [wild, clamped] : {std::pair{7.5f, 32768}, {-1.0f, 0}, {NAN, 0}}) {
     WorldBuffer from(1, 1, HX_FORMAT_ARGBF), to(1, 1, HX_FORMAT_ARGB16);
-    from.row<float>(0)[0] = wild[i];
+    *from.row<float>(0) = wild;
     CopyWorld(from.world(), to.world(), nullptr, nullptr);
-    EXPECT_EQ(to.row<HX_Pixel16>(0)[0].alpha, clamped[i]);
+    EXPECT_EQ(to.row<HX_Pixel16>(0)->alpha, clamped);
   }
 }
 
@@ -230,22 +227,20 @@ TEST(Blur, IsTheGaussianSumOverItsSquareAtEveryPixel) {
 }
 
 TEST(ColourOfHls, LightnessIsTheBrightestComponent) {
-  const auto colour = [](double hue, double lightness, double saturation) {
-    const std::int32_t hls[3] = {static_cast<std::int32_t>(hue * 65536),
-                                 static_cast<std::int32_t>(lightness * 65536),
-                                 static_cast<std::int32_t>(saturation * 65536)};
-    const HX_Pixel8 rgb = ColourOfHls(hls);
-    return std::array<int, 4>{rgb.alpha, rgb.red, rgb.green, rgb.blue};
-  };
+  constexpr std::int32_t kOne = 1 << 16, kHalf = kOne / 2, kQuarter = kOne / 4;
   const struct {
-    double hue, lightness, saturation;
-    std::array<int, 4> rgb;
-  } cases[] = {{0, 1, 1, {255, 255, 0, 0}},      {0.25, 1, 1, {255, 128, 255, 0}},
-               {0.5, 1, 1, {255, 0, 255, 255}},  {0.75, 1, 1, {255, 128, 0, 255}},
-               {1, 1, 1, {255, 255, 0, 0}},      {0.5, 0.5, 0.5, {255, 64, 128, 128}},
-               {0.3, 1, 0, {255, 255, 255, 255}}};
+    std::int32_t hls[3];
+    std::array<int, 4> argb;
+  } cases[] = {{{0, kOne, kOne}, {255, 255, 0, 0}},
+               {{kQuarter, kOne, kOne}, {255, 128, 255, 0}},
+               {{kHalf, kOne, kOne}, {255, 0, 255, 255}},
+               {{kHalf + kQuarter, kOne, kOne}, {255, 128, 0, 255}},
+               {{kOne, kOne, kOne}, {255, 255, 0, 0}},
+               {{kHalf, kHalf, kHalf}, {255, 64, 128, 128}},
+               {{kOne * 3 / 10, kOne, 0}, {255, 255, 255, 255}}};
   for (const auto& c : cases) {
-    EXPECT_EQ(colour(c.hue, c.lightness, c.saturation), c.rgb) << c.hue;
+    const HX_Pixel8 found = ColourOfHls(c.hls);
+    EXPECT_EQ((std::array<int, 4>{found.alpha, found.red, found.green, found.blue}), c.argb);
   }
 }
 

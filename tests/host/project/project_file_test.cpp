@@ -6,7 +6,6 @@
 #include <unistd.h>
 
 #include <filesystem>
-#include <fstream>
 #include <tuple>
 
 #include "host/project/sqlite.h"
@@ -19,22 +18,17 @@ namespace {
 namespace fs = std::filesystem;
 using ::testing::HasSubstr;
 
-class ProjectTest : public testing::Test {
+class ProjectTest : public testing::Test, protected ScratchFolder {
  protected:
   ProjectTest() {
-    fs::create_directories(Path("clips"));
-    WriteFile(Path("clips/walk.mp4"), "a walk");
-  }
-
-  std::string Path(const std::string& name) const { return folder_.In(name); }
-  static void WriteFile(const std::string& path, const std::string& text) {
-    std::ofstream(path) << text;
+    fs::create_directories(In("clips"));
+    MakeFile("clips/walk.mp4", "a walk");
   }
 
   // Of a size that takes SQLite many pages; `mark` tells one from another throughout.
   Project Sample(int mark, std::size_t bytes = 300000) const {
     Project project;
-    project.clip_path = Path("clips/walk.mp4");
+    project.clip_path = In("clips/walk.mp4");
     project.clip_content = ContentOf(project.clip_path);
     project.clip_frames.assign(bytes / 100, static_cast<std::uint8_t>(mark + 50));
     project.width = 1920;
@@ -50,46 +44,36 @@ class ProjectTest : public testing::Test {
     return project;
   }
 
-  static void ExpectSame(const Project& a, const Project& b) {
-    const auto all = [](const Project& p) {
-      return std::tie(p.width, p.height, p.pixel_aspect.num, p.pixel_aspect.den, p.start_frame,
-                      p.length, p.ticks_per_frame, p.field_type, p.clip_content, p.clip_frames,
-                      p.effect.match_name, p.effect.values, p.effect.instance);
-    };
-    EXPECT_TRUE(all(a) == all(b));
+  // All that is saved of one.
+  static auto All(const Project& p) {
+    return std::tie(p.width, p.height, p.pixel_aspect.num, p.pixel_aspect.den, p.start_frame,
+                    p.length, p.ticks_per_frame, p.field_type, p.clip_content, p.clip_frames,
+                    p.effect.match_name, p.effect.values, p.effect.instance);
   }
-
-  static std::string Refusal(const std::function<void()>& work) {
-    try {
-      work();
-    } catch (const ProjectFailure& failure) {
-      return failure.what();
-    }
-    return "";
-  }
-
-  const ScratchFolder folder_;
 };
 
+auto IsRefused(const std::string& part) {
+  return testing::ThrowsMessage<ProjectFailure>(HasSubstr(part));
+}
+
 TEST_F(ProjectTest, TheClipIsFoundBesideAProjectThatMovedOrWhereItWas) {
-  const std::string path = Path("moved/walk.calm");
-  fs::create_directories(Path("moved/clips"));
-  SaveProject(Path("walk.calm"), Sample(1));
-  fs::rename(Path("walk.calm"), path);
+  const std::string path = In("moved/walk.calm");
+  fs::create_directories(In("moved/clips"));
+  SaveProject(In("walk.calm"), Sample(1));
+  fs::rename(In("walk.calm"), path);
   const Project project = LoadProject(path);
   EXPECT_EQ(project.clip_relative, "clips/walk.mp4");
-  EXPECT_EQ(FindClip(path, project), Path("clips/walk.mp4"));
+  EXPECT_EQ(FindClip(path, project), In("clips/walk.mp4"));
   // Another clip in one place is no obstacle; alone it is one.
-  fs::rename(Path("clips/walk.mp4"), Path("moved/walk.mp4"));
-  WriteFile(Path("clips/walk.mp4"), "a run");
-  EXPECT_EQ(FindClip(path, project), Path("moved/walk.mp4"));
-  fs::rename(Path("moved/walk.mp4"), Path("moved/clips/walk.mp4"));
-  EXPECT_EQ(FindClip(path, project), Path("moved/clips/walk.mp4"));
-  fs::remove(Path("moved/clips/walk.mp4"));
-  EXPECT_THAT(Refusal([&] { FindClip(path, project); }),
-              HasSubstr("clips/walk.mp4: is not the clip"));
-  fs::remove(Path("clips/walk.mp4"));
-  EXPECT_THAT(Refusal([&] { FindClip(path, project); }), HasSubstr("is gone"));
+  fs::rename(In("clips/walk.mp4"), In("moved/walk.mp4"));
+  MakeFile("clips/walk.mp4", "a run");
+  EXPECT_EQ(FindClip(path, project), In("moved/walk.mp4"));
+  fs::rename(In("moved/walk.mp4"), In("moved/clips/walk.mp4"));
+  EXPECT_EQ(FindClip(path, project), In("moved/clips/walk.mp4"));
+  fs::remove(In("moved/clips/walk.mp4"));
+  EXPECT_THAT([&] { FindClip(path, project); }, IsRefused("clips/walk.mp4: is not the clip"));
+  fs::remove(In("clips/walk.mp4"));
+  EXPECT_THAT([&] { FindClip(path, project); }, IsRefused("is gone"));
 }
 
 TEST_F(ProjectTest, ProjectsOfOlderVersionsAreTakenAndReplaced) {
@@ -104,7 +88,7 @@ TEST_F(ProjectTest, ProjectsOfOlderVersionsAreTakenAndReplaced) {
                {2, aspect, "139746d3-1f72-716f-bb11-540ad5d927c4", 64, 45}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.version);
-    const std::string path = Path("old" + std::to_string(c.version) + ".calm");
+    const std::string path = In("old" + std::to_string(c.version) + ".calm");
     const std::string sql =
         "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
         "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
@@ -128,20 +112,20 @@ TEST_F(ProjectTest, ProjectsOfOlderVersionsAreTakenAndReplaced) {
     EXPECT_TRUE(project.clip_frames.empty());
     for (const std::size_t bytes : {300000, 0}) {
       SaveProject(path, Sample(2, bytes));
-      ExpectSame(LoadProject(path), Sample(2, bytes));
+      EXPECT_TRUE(All(LoadProject(path)) == All(Sample(2, bytes)));
     }
   }
 }
 
 TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
-  WriteFile(Path("notes.calm"), std::string(5000, 'n'));
-  WriteFile(Path("empty.calm"), "");
-  SqliteDatabase(Path("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
+  MakeFile("notes.calm", std::string(5000, 'n'));
+  MakeFile("empty.calm", "");
+  SqliteDatabase(In("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
       .Run("CREATE TABLE t (x)");
-  SaveProject(Path("newer.calm"), Sample(1));
-  SqliteDatabase(Path("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 4");
-  SaveProject(Path("large.calm"), Sample(1, 5000), 5000);
-  ExpectSame(LoadProject(Path("large.calm"), 5000), Sample(1, 5000));
+  SaveProject(In("newer.calm"), Sample(1));
+  SqliteDatabase(In("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 4");
+  SaveProject(In("large.calm"), Sample(1, 5000), 5000);
+  EXPECT_TRUE(All(LoadProject(In("large.calm"), 5000)) == All(Sample(1, 5000)));
   const struct {
     const char *name, *load;
     std::size_t bytes;
@@ -155,57 +139,43 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
                {"no/such/folder.calm", "is not there", 4999, ""}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
-    const std::string before = folder_.Content(c.name);
-    EXPECT_THAT(Refusal([&] { LoadProject(Path(c.name), 4999); }), HasSubstr(c.load));
-    EXPECT_THAT(Refusal([&] { SaveProject(Path(c.name), Sample(2, c.bytes), 4999); }),
-                testing::AllOf(HasSubstr(c.save), testing::Not("")));
-    EXPECT_TRUE(folder_.Content(c.name) == before);
+    const std::string before = Content(c.name);
+    EXPECT_THAT([&] { LoadProject(In(c.name), 4999); }, IsRefused(c.load));
+    EXPECT_THAT([&] { SaveProject(In(c.name), Sample(2, c.bytes), 4999); }, IsRefused(c.save));
+    EXPECT_TRUE(Content(c.name) == before);
   }
 }
 
 TEST_F(ProjectTest, DamageIsToldAndNeverMore) {
-  SaveProject(Path("whole.calm"), Sample(1, 3000));
-  const std::string whole = folder_.Content("whole.calm");
+  SaveProject(In("whole.calm"), Sample(1, 3000));
+  const std::string whole = Content("whole.calm");
   for (std::size_t at = 0; at < whole.size(); at += 97) {
     std::string flipped = whole;
     flipped[at] = static_cast<char>(~flipped[at]);
     for (const std::string& damaged : {flipped, whole.substr(0, at)}) {
-      WriteFile(Path("damaged.calm"), damaged);
-      // Told, or where it counts for nothing.
-      if (!Refusal([&] { LoadProject(Path("damaged.calm")); }).empty()) continue;
-      ExpectSame(LoadProject(Path("damaged.calm")), Sample(1, 3000));
+      MakeFile("damaged.calm", damaged);
+      try {  // told, or where it counts for nothing
+        EXPECT_TRUE(All(LoadProject(In("damaged.calm"))) == All(Sample(1, 3000)));
+      } catch (const ProjectFailure&) {
+      }
     }
   }
 }
 
 // Calls of SQLite that change files, until the one that the process does not live to see.
 int steps_left = 0;
-void Step() {
+template <auto kCall, class... Args>
+auto Counted(Args... args) {
   if (--steps_left == 0) _exit(1);
+  return kCall(args...);
 }
 
 TEST_F(ProjectTest, AnyStepOfASaveMayBeTheLast) {
-  constexpr auto kOpen = [](const char* path, int flags, int mode) {
-    Step();
-    return open(path, flags, mode);
-  };
-  constexpr auto kWrite = [](int file, const void* bytes, std::size_t size, off_t at) {
-    Step();
-    return pwrite(file, bytes, size, at);
-  };
-  constexpr auto kTruncate = [](int file, off_t size) {
-    Step();
-    return ftruncate(file, size);
-  };
-  constexpr auto kUnlink = [](const char* path) {
-    Step();
-    return unlink(path);
-  };
   const auto count = [](const char* name, auto* counted) {
     sqlite3_vfs* const system = sqlite3_vfs_find(nullptr);
     system->xSetSystemCall(system, name, reinterpret_cast<sqlite3_syscall_ptr>(counted));
   };
-  const std::string path = Path("walk.calm");
+  const std::string path = In("walk.calm");
   for (const bool was_there : {false, true}) {
     int seen = 0, status = 1;
     for (int step = 1; status != 0; ++step) {
@@ -215,11 +185,11 @@ TEST_F(ProjectTest, AnyStepOfASaveMayBeTheLast) {
       const pid_t child = fork();
       ASSERT_GE(child, 0);
       if (child == 0) {
-        count("open", +kOpen);
-        count("pwrite", +kWrite);
-        count("pwrite64", +kWrite);
-        count("ftruncate", +kTruncate);
-        count("unlink", +kUnlink);
+        count("open", &Counted<open, const char*, int, int>);
+        count("pwrite", &Counted<pwrite, int, const void*, std::size_t, off_t>);
+        count("pwrite64", &Counted<pwrite, int, const void*, std::size_t, off_t>);
+        count("ftruncate", &Counted<ftruncate, int, off_t>);
+        count("unlink", &Counted<unlink, const char*>);
         steps_left = step;
         SaveProject(path, Sample(2, 20000));
         _exit(0);
@@ -234,7 +204,7 @@ TEST_F(ProjectTest, AnyStepOfASaveMayBeTheLast) {
       EXPECT_TRUE(mark == 2 || (mark == 1 && was_there && status != 0)) << mark;
       EXPECT_GE(mark, seen) << "what was saved stays saved";
       seen = mark;
-      ExpectSame(kept, Sample(mark, 20000));
+      EXPECT_TRUE(All(kept) == All(Sample(mark, 20000)));
     }
     EXPECT_EQ(seen, 2);
   }

@@ -52,7 +52,7 @@ class GraphSuitesTest : public TimelineTest {
   }
 };
 
-TEST_F(GraphSuitesTest, EffectsStandAboveTheMediaInTheirOrder) {
+TEST_F(GraphSuitesTest, EffectsStandAboveTheMediaAndTellAllThatIsBeneath) {
   // Stored by projects: they may never change.
   EXPECT_THAT(Walk().guids, testing::ElementsAre("e5c96a89-a797-6c3e-32c9-a1b7786fd426",
                                                  "8ba10cfc-4f53-1d12-d9a8-7116fc5c5072"));
@@ -75,21 +75,17 @@ TEST_F(GraphSuitesTest, EffectsStandAboveTheMediaInTheirOrder) {
     Guid guid;
     EXPECT_TRUE(Guid::Parse(text, &guid));
   }
-}
 
-TEST_F(GraphSuitesTest, AChangeShowsInAllThatStandsAboveIt) {
-  layer->InsertEffect(0, {50, "Upstream", "a=1", {}});
-  layer->InsertEffect(2, {60, "Downstream", "", {}});
-  const Chain before = Walk();
-  layer->SetParameters(60, "b=1");
+  // A change shows in all that stands above it.
+  layer->SetParameters(1060, "b=1");
   const Chain downstream = Walk();
-  EXPECT_NE(downstream.guids[0], before.guids[0]);
-  EXPECT_NE(downstream.texts[0], before.texts[0]);
-  for (int i = 1; i < 4; ++i) EXPECT_EQ(downstream.guids[i], before.guids[i]);
-  layer->SetParameters(50, "a=2");
+  EXPECT_NE(downstream.guids[0], chain.guids[0]);
+  EXPECT_NE(downstream.texts[0], chain.texts[0]);
+  for (int i = 1; i < 4; ++i) EXPECT_EQ(downstream.guids[i], chain.guids[i]);
+  layer->SetParameters(1050, "a=2");
   const Chain upstream = Walk();
   for (int i = 0; i < 3; ++i) EXPECT_NE(upstream.guids[i], downstream.guids[i]);
-  EXPECT_EQ(upstream.guids[3], before.guids[3]);
+  EXPECT_EQ(upstream.guids[3], chain.guids[3]);
 }
 
 TEST_F(GraphSuitesTest, ALayerStandsFromItsInPointForItsLength) {

@@ -1,7 +1,5 @@
 #include "host/timeline/layer.h"
 
-#include <gtest/gtest.h>
-
 #include <stdexcept>
 #include <thread>
 

@@ -1,7 +1,6 @@
 #include "host/timeline/render_queue.h"
 
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <algorithm>
 #include <atomic>

@@ -70,12 +70,8 @@ class RenderSuitesTest : public TimelineTest {
   }
   PicturePtr Input(std::int64_t frame, PixelKind kind = PixelKind::argb8, int width = 0,
                    int height = 0) {
-    InputRequest request;
-    request.time_ticks = frame * kFrame;
-    request.kind = kind;
-    request.width = width;
-    request.height = height;
-    return services.Input(effect, request);
+    return services.Input(
+        effect, {.time_ticks = frame * kFrame, .kind = kind, .width = width, .height = height});
   }
 
   std::string Identifier(HX_Node node, std::int64_t ticks,

@@ -4,7 +4,6 @@
 
 #include <boost/make_shared.hpp>
 #include <string>
-#include <vector>
 
 #include "host/base/operations.h"
 #include "host/timeline/media_services.h"
