@@ -6,10 +6,9 @@
 #include <cstring>
 #include <fstream>
 #include <iterator>
+#include <memory>
 #include <string>
 #include <vector>
-
-#include "platform/hx/hx_effect.h"
 
 namespace {
 
@@ -19,29 +18,8 @@ std::string Little(std::uint32_t value, int bytes) {
   return text;
 }
 
-// The record as a stranger finds it: by the symbol's name, as large as the symbol.
-class PropertyRecordTest : public testing::Test {
- protected:
-  void SetUp() override {
-    library_ = dlopen(PROBE_PLUGIN, RTLD_NOW | RTLD_LOCAL);
-    ASSERT_TRUE(library_) << dlerror();
-    const char* const record = static_cast<const char*>(dlsym(library_, "HXPL_16000"));
-    ASSERT_TRUE(record) << dlerror();
-    Dl_info info;
-    ElfW(Sym)* symbol = nullptr;
-    ASSERT_TRUE(dladdr1(record, &info, reinterpret_cast<void**>(&symbol), RTLD_DL_SYMENT));
-    ASSERT_STREQ(info.dli_sname, "HXPL_16000");
-    record_.assign(record, symbol->st_size);
-  }
-  void TearDown() override {
-    if (library_) dlclose(library_);
-  }
-
-  void* library_ = nullptr;
-  std::string record_;
-};
-
-TEST_F(PropertyRecordTest, TwelvePropertiesAndNothingElse) {
+// Twelve properties and nothing else.
+std::string Record() {
   using namespace std::string_literals;
   const struct {
     const char* key;
@@ -65,19 +43,24 @@ TEST_F(PropertyRecordTest, TwelvePropertiesAndNothingElse) {
   for (const auto& [key, length, value] : properties) {
     expected += "XVN8"s + key + Little(0, 4) + Little(length, 4) + value;
   }
-  EXPECT_EQ(record_, expected);
+  return expected;
 }
 
-TEST_F(PropertyRecordTest, NamesTheEntryThatAHostThenCalls) {
-  const auto entry = reinterpret_cast<HX_EffectMain>(dlsym(library_, "EffectMainExtra"));
-  ASSERT_TRUE(entry) << dlerror();
-  HX_OutData out{};
-  EXPECT_EQ(entry(0, nullptr, &out, nullptr, nullptr, nullptr), 0);
-  EXPECT_EQ(out.version, 1234u);
+// As a stranger finds it: by the symbol's name, as large as the symbol.
+TEST(PropertyRecord, IsLoadedByItsName) {
+  const std::unique_ptr<void, int (*)(void*)> library(dlopen(CALMFRAME_PLUGIN, RTLD_NOW), dlclose);
+  ASSERT_TRUE(library) << dlerror();
+  const char* const record = static_cast<const char*>(dlsym(library.get(), "HXPL_16000"));
+  ASSERT_TRUE(record) << dlerror();
+  Dl_info info;
+  ElfW(Sym)* symbol = nullptr;
+  ASSERT_TRUE(dladdr1(record, &info, reinterpret_cast<void**>(&symbol), RTLD_DL_SYMENT));
+  ASSERT_STREQ(info.dli_sname, "HXPL_16000");
+  EXPECT_EQ(std::string(record, symbol->st_size), Record());
 }
 
-TEST_F(PropertyRecordTest, FillsASectionOfItsOwn) {
-  std::ifstream file(PROBE_PLUGIN, std::ios::binary);
+TEST(PropertyRecord, FillsASectionOfItsOwn) {
+  std::ifstream file(CALMFRAME_PLUGIN, std::ios::binary);
   const std::string bytes((std::istreambuf_iterator<char>(file)), {});
   ElfW(Ehdr) header;
   ASSERT_GT(bytes.size(), sizeof(header));
@@ -92,7 +75,7 @@ TEST_F(PropertyRecordTest, FillsASectionOfItsOwn) {
       found.push_back(bytes.substr(section.sh_offset, section.sh_size));
     }
   }
-  EXPECT_EQ(found, std::vector<std::string>{record_});
+  EXPECT_EQ(found, std::vector<std::string>{Record()});
 }
 
 }  // namespace

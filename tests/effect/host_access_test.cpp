@@ -8,7 +8,7 @@
 #include "effect/param_checkout.h"
 #include "effect/suite.h"
 #include "effect/world.h"
-#include "tests/effect/host_records.h"
+#include "tests/support/host_records.h"
 
 namespace kelp::effect {
 namespace {
@@ -29,13 +29,9 @@ HX_Err Refuse(const char* name, std::int32_t version, const void**) {
   return 1;
 }
 
-template <class Table>
+template <class Table, std::int32_t... version>
 void Ask(const HostContext& context) {
-  ScopedSuite<Table> suite(context);
-}
-template <class Table, std::int32_t version>
-void Ask(const HostContext& context) {
-  ScopedSuite<Table> suite(context, version);
+  ScopedSuite<Table> suite(context, version...);
 }
 
 TEST_F(HostAccessTest, EverySuiteIsThereAndMayBeRefused) {
@@ -74,10 +70,12 @@ TEST_F(HostAccessTest, EverySuiteIsThereAndMayBeRefused) {
   EXPECT_EQ(TakeMessage(), "No worlds.");
 }
 
+// Those of a planned frame are asked of whole renders.
 TEST_F(HostAccessTest, RefusalsAreTheHostsCodes) {
   const OwnedHandle handle(*in_.cb, std::uint64_t{8});
   EXPECT_EQ(Thrown([&] { HandleLock guard(*in_.cb, nullptr); }), 3);
-  EXPECT_EQ(Thrown([&] { ParamCheckout param(context_, 2); }), HX_ERR_UNKNOWN);
+  EXPECT_EQ(Thrown([&] { ParamCheckout param(context_, 1000); }), HX_ERR_UNKNOWN);
+  char text[8];
   const struct {
     const char* operation;
     std::function<void()> body;
@@ -87,27 +85,13 @@ TEST_F(HostAccessTest, RefusalsAreTheHostsCodes) {
       {"new_handle", [&] { ThrowIfFailed(OwnedHandle(*in_.cb, std::uint64_t{8}) ? 0 : 55); }, 55},
       {"checkout_param", [&] { ParamCheckout param(context_, 1); }, kFaultCode},
       {"World.NewWorld", [&] { ScopedWorld w(context_, 4, 3, true, HX_FORMAT_ARGBF); }, kFaultCode},
-      {"Private Effect.ConvertText",
-       [&] {
-         char text[8];
-         ConvertToHostText(context_, "x", text, sizeof text);
-       },
+      {"Private Effect.ConvertText", [&] { ConvertToHostText(context_, "x", text, sizeof text); },
        kFaultCode}};
   for (const auto& [operation, body, code] : refusals) {
     Operations::Get().FailNth(1, operation);
     EXPECT_EQ(Thrown(body), code) << operation;
     EXPECT_EQ(Thrown(body), 0) << operation;
   }
-}
-
-TEST_F(HostAccessTest, AFrameThatWasNotPlannedIsNotCheckedIn) {
-  HX_RenderExtra render{};
-  render.checkout_layer_pixels = [](HX_EffectRef, std::int32_t, HX_World**) -> HX_Err {
-    return 88;
-  };
-  HostContext context = context_;
-  context.extra = &render;
-  EXPECT_EQ(Thrown([&] { PlannedLayer layer(context, 6); }), 88);
 }
 
 TEST_F(HostAccessTest, ReportsNameTheFrameAndFailQuietly) {

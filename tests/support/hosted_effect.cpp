@@ -5,6 +5,7 @@
 #include <chrono>
 #include <cstring>
 #include <set>
+#include <type_traits>
 
 #include "host/pixels/world_operations.h"
 #include "stabilizer/effect/src/instance_handle.h"
@@ -14,18 +15,11 @@
 
 // The plug-in's own, see stabilizer/effect/src/plugin_entry.cpp and renderer_exports.cpp.
 extern "C" {
-HX_Err EffectMainExtra(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef* params[],
-                       HX_World* output, void* extra);
-std::uint8_t allowCUDARendering(const void* block);
-const HX_VarVector* getOVVarVector(const void* block, std::int32_t frame);
-void getCropWindow(const void* block, std::int32_t frame, float* left, float* top, float* right,
-                   float* bottom);
-std::uint8_t getStabilizerData(const void* block, std::int32_t* frame_count,
-                               std::int32_t* first_frame, std::int32_t* grid_columns,
-                               std::int32_t* grid_rows, std::int32_t* crop_width,
-                               std::int32_t* crop_height, float* min_x, float* min_y, float* max_x,
-                               float* max_y, std::int32_t* source_width,
-                               std::int32_t* source_height);
+std::remove_pointer_t<HX_EffectMain> EffectMainExtra;
+std::remove_pointer_t<HX_AllowCUDARendering> allowCUDARendering;
+std::remove_pointer_t<HX_GetOVVarVector> getOVVarVector;
+std::remove_pointer_t<HX_GetCropWindow> getCropWindow;
+std::remove_pointer_t<HX_GetStabilizerData> getStabilizerData;
 }
 
 namespace calmframe::host {
@@ -215,37 +209,48 @@ std::int32_t HostedEffect::deletions_index() const {
   return static_cast<std::int32_t>(host_->declarations().size()) - 1;
 }
 
+HX_CustomDataExtra HostedEffect::DataExtra(std::int32_t op, HX_Handle a, HX_Handle b,
+                                           std::vector<std::uint64_t>* keys) {
+  HX_CustomDataExtra extra{op, kDeletionsDiskId, a, b, nullptr, 0, nullptr, 0.5, 99};
+  if (keys) {
+    extra.buffer = keys->data();
+    extra.size = static_cast<std::uint32_t>(keys->size() * sizeof(std::uint64_t));
+  }
+  return extra;
+}
+
 CommandResult HostedEffect::DataOp(HX_CustomDataExtra& extra) {
   HX_InData in{};
   HX_OutData out{};
   return host_->Command(HX_CMD_CUSTOM_DATA_OP, in, out, nullptr, nullptr, &extra);
 }
 
+HX_CustomDataExtra HostedEffect::DataOp(std::int32_t op, HX_Handle a, HX_Handle b,
+                                        std::vector<std::uint64_t>* keys) {
+  HX_CustomDataExtra extra = DataExtra(op, a, b, keys);
+  EXPECT_TRUE(DataOp(extra).ok()) << op;
+  return extra;
+}
+
+HX_Handle HostedEffect::MakeDeletions(std::vector<std::uint64_t> keys) {
+  return DataOp(HX_DATA_UNFLATTEN, nullptr, nullptr, &keys).out;
+}
+
+std::vector<std::uint64_t> HostedEffect::DeletionsIn(HX_Handle value) {
+  std::vector<std::uint64_t> keys(DataOp(HX_DATA_FLAT_SIZE, value).size / sizeof(std::uint64_t));
+  DataOp(HX_DATA_FLATTEN, value, nullptr, &keys);
+  return keys;
+}
+
 void HostedEffect::SetDeletions(const std::vector<std::uint64_t>& keys) {
-  std::vector<std::uint64_t> flat = keys;
-  HX_CustomDataExtra extra{};
-  extra.op = HX_DATA_UNFLATTEN;
-  extra.param_id = kDeletionsDiskId;
-  extra.buffer = flat.data();
-  extra.size = static_cast<std::uint32_t>(flat.size() * sizeof flat[0]);
-  EXPECT_TRUE(DataOp(extra).ok());
-  deletions_.push_back(extra.out);
+  deletions_.push_back(MakeDeletions(keys));
   HX_ParamDef param = *effect_->Param(deletions_index());
-  param.u.arb_d.value = extra.out;
+  param.u.arb_d.value = deletions_.back();
   EXPECT_TRUE(effect_->shared()->params().SetByPlugin(deletions_index(), param));
 }
 
 std::vector<std::uint64_t> HostedEffect::Deletions() {
-  HX_CustomDataExtra extra{};
-  extra.op = HX_DATA_FLAT_SIZE;
-  extra.param_id = kDeletionsDiskId;
-  extra.a = effect_->Param(deletions_index())->u.arb_d.value;
-  EXPECT_TRUE(DataOp(extra).ok());
-  std::vector<std::uint64_t> keys(extra.size / sizeof(std::uint64_t));
-  extra.op = HX_DATA_FLATTEN;
-  extra.buffer = keys.data();
-  EXPECT_TRUE(DataOp(extra).ok());
-  return keys;
+  return DeletionsIn(effect_->Param(deletions_index())->u.arb_d.value);
 }
 
 // The effect may have put another value in the place of the last one.
@@ -256,13 +261,7 @@ void HostedEffect::DisposeOfDeletions() {
     values.insert(effect->Param(deletions_index())->u.arb_d.value);
   }
   values.erase(nullptr);
-  for (const HX_Handle value : values) {
-    HX_CustomDataExtra extra{};
-    extra.op = HX_DATA_DISPOSE;
-    extra.param_id = kDeletionsDiskId;
-    extra.a = value;
-    EXPECT_TRUE(DataOp(extra).ok());
-  }
+  for (const HX_Handle value : values) DataOp(HX_DATA_DISPOSE, value);
 }
 
 // -- Past the host --

@@ -54,7 +54,6 @@ class HostedEffect {
   Host& host() { return *host_; }
   Session& session() { return *session_; }
   Layer& layer() { return *layer_; }
-  const boost::shared_ptr<Layer>& shared_layer() const { return layer_; }
   // The one that was applied or opened last; there must be one.
   Effect& effect() { return *effect_; }
 
@@ -116,8 +115,14 @@ class HostedEffect {
   void SetDeletions(const std::vector<std::uint64_t>& keys);
   std::vector<std::uint64_t> Deletions();
   std::int32_t deletions_index() const;
-  // HX_CMD_CUSTOM_DATA_OP on the parameter.
+  // HX_CMD_CUSTOM_DATA_OP on the parameter, for values that the caller disposes of.
+  static HX_CustomDataExtra DataExtra(std::int32_t op, HX_Handle a = nullptr, HX_Handle b = nullptr,
+                                      std::vector<std::uint64_t>* keys = nullptr);
   CommandResult DataOp(HX_CustomDataExtra& extra);
+  HX_CustomDataExtra DataOp(std::int32_t op, HX_Handle a = nullptr, HX_Handle b = nullptr,
+                            std::vector<std::uint64_t>* keys = nullptr);
+  HX_Handle MakeDeletions(std::vector<std::uint64_t> keys);
+  std::vector<std::uint64_t> DeletionsIn(HX_Handle value);
 
   // -- Past the host --
   // Runs `look` in place of the effect's next tick, in a call of the host's own.

@@ -42,8 +42,6 @@ class BannerTest : public ::testing::Test {
  protected:
   BannerTest() { hosted_.Apply(); }
 
-  // In a call of the host's.
-  void Look(const std::function<void(StabilizerEffect& effect)>& look) { hosted_.Inside(look); }
   // Blue, green, red, alpha of the flat or striped band, each as a drawing library may round it.
   static std::vector<int> Bytes(const WorldBuffer& band, int x, int y) {
     const auto* c = band.row<std::uint8_t>(y) + 4 * x;
@@ -66,8 +64,9 @@ class BannerTest : public ::testing::Test {
   HostedEffect hosted_{calmframe::host::SmallClip()};
 };
 
-TEST_F(BannerTest, WorkInProgressIsStripedAndTheRestIsFlat) {
-  Look([](StabilizerEffect& effect) {
+// Which status has which colour, and what is flat, is asked of the plug-in in tests/contract.
+TEST_F(BannerTest, WorkInProgressIsStriped) {
+  hosted_.Inside([](StabilizerEffect& effect) {
     const auto blue = Near(255, 64, 2, 204), dark = Near(204, 51, 2, 204);
     auto band = Band(effect, FrameStatus::AnalysisInProgress);
     // Stripes of 24 * 1.414 = 33.936 pixels, 32.936 apart from -1628.928 on, and 67.872 to the
@@ -89,19 +88,12 @@ TEST_F(BannerTest, WorkInProgressIsStripedAndTheRestIsFlat) {
     band = Band(effect, FrameStatus::SubsequentSolveOnDeletion);
     EXPECT_THAT(Bytes(*band, 30, 47), Near(0, 85, 204, 51));
     EXPECT_THAT(Bytes(*band, 60, 47), Near(0, 68, 163, 51));
-    for (const FrameStatus flat : {FrameStatus::TrackingFailed, FrameStatus::SolveFailed,
-                                   FrameStatus::GeneralFailure, FrameStatus::OverCropped}) {
-      band = Band(effect, flat);
-      for (const int x : {0, 30, 60}) EXPECT_THAT(Bytes(*band, x, 47), Near(0, 0, 197, 204));
-    }
-    band = Band(effect, FrameStatus::OutsideRange);
-    for (const int x : {0, 30, 60}) EXPECT_THAT(Bytes(*band, x, 47), blue);
   });
 }
 
 // Depths, scales and paths are asked of the plug-in in tests/contract.
 TEST_F(BannerTest, TheTextIsWhiteAndNowhereButInItsPlace) {
-  Look([](StabilizerEffect& effect) {
+  hosted_.Inside([](StabilizerEffect& effect) {
     effect.context().in->width = 640;
     effect.context().in->height = 360;
     WorldBuffer output(640, 360, HX_FORMAT_ARGBF);
@@ -121,8 +113,6 @@ TEST_F(BannerTest, TheTextIsWhiteAndNowhereButInItsPlace) {
         if (u >= 0 && v >= 0 && u < layout.text_width && v < layout.text_height) {
           brightest = std::max(brightest, green);
         } else {
-          EXPECT_NEAR(ChannelAt(output, x, y, 0), 0.8, 0.004);
-          EXPECT_NEAR(ChannelAt(output, x, y, 1), 0.77255, 0.004);
           EXPECT_NEAR(green, 0, 0.004) << x << " " << y;
         }
       }
@@ -132,7 +122,7 @@ TEST_F(BannerTest, TheTextIsWhiteAndNowhereButInItsPlace) {
 }
 
 TEST_F(BannerTest, AnImageIsMadeOncePerStatusAndFailureText) {
-  Look([](StabilizerEffect& effect) {
+  hosted_.Inside([](StabilizerEffect& effect) {
     WorldBuffer output(96, 64, HX_FORMAT_ARGB8);
     const auto draw = [&](FrameStatus status, const char* text) {
       DrawBanner(effect, {status, text}, output.world());
