@@ -34,7 +34,6 @@ class EffectGlobalsTest : public calmframe::host::HostRecords {
 
   calmframe::host::HandleStore& handles() { return hosted_.host().handles(); }
 
-  const HostContext context_ = RecordsOnly(&in_, &out_);
   std::vector<const char*> literals_;
   HX_StringTable strings_{};
 };

@@ -139,12 +139,11 @@ TEST_F(EntryTest, EventsReachTheOperationOfTheirType) {
 }
 
 TEST_F(EntryTest, WhatAnyOperationThrowsBecomesTheHostsCodeWhateverItsReportThrows) {
-  struct Failure {
+  const struct {
     std::function<void()> thrown;
     HX_Err code;
     const char* report;
-  };
-  const Failure failures[] = {
+  } failures[] = {
       {[] { throw std::int32_t{514}; }, 514, nullptr},
       {[] { throw std::bad_alloc(); }, 4, "OutOfMemory"},
       {[] { throw std::bad_array_new_length(); }, 4, "OutOfMemory"},
@@ -152,7 +151,7 @@ TEST_F(EntryTest, WhatAnyOperationThrowsBecomesTheHostsCodeWhateverItsReportThro
       {[] { throw "a literal"; }, 1, "UnknownException"},
       {[] { throw std::int64_t{514}; }, 1, "UnknownException"},
   };
-  for (const Failure& failure : failures) {
+  for (const auto& failure : failures) {
     script.operation = failure.thrown;
     for (const auto& [command, operation] : kOperations) {
       for (const bool throws : {false, true}) {

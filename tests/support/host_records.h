@@ -22,7 +22,8 @@ class HostRecords : public testing::Test {
     hosted_.Apply();
     hosted_.Inside([this](const auto& effect) { in_ = *effect.context().in; });
     basic_ = in_.basic;
-    in_.basic = &kBasic;
+    answering_ = {Acquire, basic_->release};
+    in_.basic = &answering_;
   }
   ~HostRecords() override { replaced_.clear(); }
 
@@ -66,6 +67,7 @@ class HostRecords : public testing::Test {
   HostedEffect hosted_;
   HX_InData in_{};
   HX_OutData out_{};
+  const kelp::effect::HostContext context_ = kelp::effect::RecordsOnly(&in_, &out_);
 
  private:
   static HX_Err Acquire(const char* name, std::int32_t version, const void** table) {
@@ -74,11 +76,8 @@ class HostRecords : public testing::Test {
     if (code == HX_ERR_NONE && found != replaced_.end()) *table = found->second;
     return code;
   }
-  static HX_Err Release(const char* name, std::int32_t version) {
-    return basic_->release(name, version);
-  }
 
-  static constexpr HX_BasicSuite kBasic = {Acquire, Release};
+  static inline HX_BasicSuite answering_{};
   static inline const HX_BasicSuite* basic_ = nullptr;
   static inline std::map<std::string, const void*> replaced_;
 };

@@ -1,6 +1,5 @@
 #include "tests/support/hosted_effect.h"
 
-#include <atomic>
 #include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstring>
@@ -31,7 +30,6 @@ using kelp::effect::StabilizerEffect;
 using namespace std::chrono_literals;
 
 constexpr std::int32_t kDeletionsDiskId = 305;
-constexpr std::int64_t kNoFrame = -1;
 
 // Of the one hosted effect; constant while renders are under way.
 bool keeps_deletions = false;
@@ -65,8 +63,7 @@ PluginLibrary Linked() {
 
 }  // namespace
 
-HostedEffect::HostedEffect(const HostedSettings& settings)
-    : settings_(settings), held_frame_(std::make_shared<std::atomic<std::int64_t>>(kNoFrame)) {
+HostedEffect::HostedEffect(const HostedSettings& settings) : settings_(settings) {
   keeps_deletions = settings.keeps_deletions;
   HostSettings host;
   host.media.cache_bytes = std::size_t{16} << 20;
@@ -85,13 +82,12 @@ HostedEffect::HostedEffect(const SourcePtr& source, const HostedSettings& settin
 HostedEffect::HostedEffect(const ShakyClip& clip, const HostedSettings& settings)
     : HostedEffect(settings) {
   ShakyClip held = clip;
-  held.on_draw = [this, draw = clip.on_draw, frames = held_frame_](std::int64_t frame) {
+  held.on_draw = [this, draw = clip.on_draw](std::int64_t frame) {
     if (draw) draw(frame);
-    if (*frames != frame) return;
     std::shared_ptr<Hold> hold;
     {
       const std::lock_guard lock(hold_mutex_);
-      hold = hold_;
+      if (frame == held_frame_) hold = hold_;
     }
     if (hold) hold->Pass();
   };
@@ -120,17 +116,6 @@ int HostedEffect::Settle() {
   return Status();
 }
 
-int HostedEffect::Analyse() {
-  EXPECT_TRUE(Apply().creation().ok());
-  return Settle();
-}
-
-SavedEffect HostedEffect::Save() {
-  SavedEffect saved;
-  EXPECT_TRUE(effect_->Save(&saved).ok());
-  return saved;
-}
-
 Effect& HostedEffect::Open(const SavedEffect& saved) {
   if (effect_) Remove();
   effect_ = &session_->Load(layer_, saved);
@@ -149,17 +134,9 @@ void HostedEffect::Place(std::int32_t start_frame, std::int32_t length) {
   });
 }
 
-void HostedEffect::Refuse(const std::string& why) {
-  layer_->Change([&](LayerState& state) { state.refusal = why; });
-}
-
 RenderedFrame HostedEffect::Render(const RenderRequest& request, Path path) {
   if (!renderer_) renderer_ = effect_->MakeRenderer();
   return path == Path::direct ? renderer_->Direct(request) : renderer_->Planned(request);
-}
-
-bool HostedEffect::Enabled(std::int32_t index) const {
-  return (effect_->Param(index)->ui_flags & HX_PARAM_UI_DISABLED) == 0;
 }
 
 std::vector<std::string> HostedEffect::OperationsOf(const std::function<void()>& act) {
@@ -176,14 +153,10 @@ std::vector<double> HostedEffect::Warp(std::int32_t frame) {
   return {warp->values, warp->values + 2 * std::ptrdiff_t{warp->columns} * warp->rows};
 }
 
-bool HostedEffect::AllowsOutside() {
-  return host_->library().exports().allow_cuda_rendering(effect_->opaque_data()) != 0;
-}
-
 void HostedEffect::HoldAtFrame(std::int64_t frame) {
   const std::lock_guard lock(hold_mutex_);
   hold_ = std::make_shared<Hold>();
-  *held_frame_ = frame;
+  held_frame_ = frame;
 }
 
 void HostedEffect::HoldSolve(const std::string& line) {
@@ -197,17 +170,14 @@ void HostedEffect::TickUntilHeld() {
 }
 
 void HostedEffect::Release() {
-  *held_frame_ = kNoFrame;
+  const std::lock_guard lock(hold_mutex_);
+  held_frame_ = kNoFrame;
   if (!hold_) return;
   stages_.HoldAt("", nullptr);
   hold_->Release();
 }
 
 // -- Deleted track points --
-
-std::int32_t HostedEffect::deletions_index() const {
-  return static_cast<std::int32_t>(host_->declarations().size()) - 1;
-}
 
 HX_CustomDataExtra HostedEffect::DataExtra(std::int32_t op, HX_Handle a, HX_Handle b,
                                            std::vector<std::uint64_t>* keys) {
@@ -232,10 +202,6 @@ HX_CustomDataExtra HostedEffect::DataOp(std::int32_t op, HX_Handle a, HX_Handle 
   return extra;
 }
 
-HX_Handle HostedEffect::MakeDeletions(std::vector<std::uint64_t> keys) {
-  return DataOp(HX_DATA_UNFLATTEN, nullptr, nullptr, &keys).out;
-}
-
 std::vector<std::uint64_t> HostedEffect::DeletionsIn(HX_Handle value) {
   std::vector<std::uint64_t> keys(DataOp(HX_DATA_FLAT_SIZE, value).size / sizeof(std::uint64_t));
   DataOp(HX_DATA_FLATTEN, value, nullptr, &keys);
@@ -247,10 +213,6 @@ void HostedEffect::SetDeletions(const std::vector<std::uint64_t>& keys) {
   HX_ParamDef param = *effect_->Param(deletions_index());
   param.u.arb_d.value = deletions_.back();
   EXPECT_TRUE(effect_->shared()->params().SetByPlugin(deletions_index(), param));
-}
-
-std::vector<std::uint64_t> HostedEffect::Deletions() {
-  return DeletionsIn(effect_->Param(deletions_index())->u.arb_d.value);
 }
 
 // The effect may have put another value in the place of the last one.

@@ -2,7 +2,6 @@
 
 #include <gmock/gmock.h>
 
-#include <cmath>
 #include <limits>
 
 #include "analysis/effect/track_colors.h"

@@ -323,14 +323,12 @@ TEST_F(VideoSegmentRenderSuiteJobTest, WithoutTheMediaThereIsNoJob) {
   media().faults.node_missing = true;  // nothing stands under the layer
   EXPECT_THROW(Make(), tessel::config::Error);
   media().faults.node_missing = false;
-  const LayerState before = *layer().state();
-  layer().Change([](LayerState& l) { l.effects = {{1000000, "somebody else's", "", {}}}; });
-  EXPECT_THROW(Make(), tessel::config::Error);
-  layer().Change([&](LayerState& l) {
-    l = before;
+  layer().Change([](LayerState& l) {
     l.effects.resize(1100, {1000000, "too deep above", "", {}});
   });
   EXPECT_THROW(Make(), std::int32_t);
+  layer().Change([](LayerState& l) { l.effects = {{1000000, "somebody else's", "", {}}}; });
+  EXPECT_THROW(Make(), tessel::config::Error);
 }
 
 TEST_F(VideoSegmentRenderSuiteJobTest, FramesComeFromTheInputOfTheEffectsOwnNode) {

@@ -184,7 +184,6 @@ TEST_F(AnalyzerTest, AJobThatCannotStartIsNeverJoined) {
   EXPECT_TRUE(jobs_[0].expired());
 }
 
-// That the results name what they were made from is asked of the plug-in in tests/contract.
 TEST_F(AnalyzerTest, ANewAnalysisOfTheStateEndsTheOldOne) {
   stop_at_ = "get 1";
   AnalysisState state;
@@ -206,6 +205,8 @@ TEST_F(AnalyzerTest, ANewAnalysisOfTheStateEndsTheOldOne) {
   tessel::threads::Shutdown();
   EXPECT_TRUE(jobs_[0].expired());
   EXPECT_TRUE(state.TakeResults());
+  EXPECT_EQ(state.result->tracker_identity,
+            GetIdentifierForTracker(SmallSelector(), SmallTracker()));
   EXPECT_FALSE(state.result_identity.IsNil());
   state.EndAnalyzer(&in_, &out_);
   EXPECT_TRUE(jobs_[1].expired());

@@ -123,13 +123,5 @@ TEST_F(ExecutorJobTest, CancelledBeforeItsThreadTakesItUp) {
   EXPECT_EQ(late.GetStatus().state, JobState::Failed);
 }
 
-TEST_F(ExecutorJobTest, DropsItsOwnersOnItsOwnThread) {
-  Make(ClipInput(3)).Start(job_);
-  job_.reset();
-  analysis_.reset();
-  tessel::threads::Shutdown();  // waits for the run
-  EXPECT_EQ(FakeJob::living, 0);
-}
-
 }  // namespace
 }  // namespace kelp::analysis

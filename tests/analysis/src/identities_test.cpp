@@ -1,6 +1,6 @@
 #include "analysis/src/identities.h"
 
-#include <gmock/gmock.h>
+#include <gtest/gtest.h>
 
 #include <set>
 #include <string>
@@ -18,14 +18,12 @@ using marrow::tracking::TrackerParams;
 using tessel::utility::Guid;
 
 JobInput FilledInput() {
-  JobInput input;
-  input.ProjectPath = u"C:/\u00e4";
-  input.SourceID = Guid::FromText("00112233-4455-6677-8899-aabbccddeeff");
-  input.FieldType = 1;
-  input.StartTime = {1001, 3000};
-  input.Duration = {1001, 100};
-  input.StepTime = {1001, 30000};
-  return input;
+  return {.ProjectPath = u"C:/\u00e4",
+          .SourceID = Guid::FromText("00112233-4455-6677-8899-aabbccddeeff"),
+          .FieldType = 1,
+          .StartTime = {1001, 3000},
+          .Duration = {1001, 100},
+          .StepTime = {1001, 30000}};
 }
 
 // Values from a second implementation, over the pieces in the order and width that projects rely
@@ -67,7 +65,6 @@ TEST(Identities, TheirMakingIsTracedWhileTheChannelIsOn) {
   tessel::debug::SetSink({});
   ASSERT_EQ(lines.size(), 8u);
   EXPECT_EQ(lines.front(), "<MixHashGuid> <6> Start Level 'Analyzer::GetIdentifierForJobInput\n");
-  EXPECT_THAT(lines[1], ::testing::StartsWith("<MixHashGuid> <6> Added 8 bytes, now: "));
   EXPECT_EQ(lines[6],
             "<MixHashGuid> <6> Added 76 bytes, now: 4141e4ec-be25-9d3a-3e2c-d22b665f0fbc\n");
   EXPECT_EQ(lines.back(), "<MixHashGuid> <6> End level\n");
@@ -146,9 +143,7 @@ TEST_F(UpstreamIdentifierTest, OfAGraphWithoutTheEffectIsNilAndWithoutAnEndThrow
   EXPECT_THROW(Identifier(), std::int32_t);
 }
 
-using HostsFailures = calmframe::host::HostRecords;
-
-TEST_F(HostsFailures, AreHandedOnByTheUpstreamIdentifier) {
+TEST_F(UpstreamIdentifierTest, HandsOnTheHostsFailures) {
   for (const char* operation :
        {"Sequence Info.AcquireSegments", "Utility.GetStartFrame", "Utility.GetFrameCount",
         "Utility.GetTicksPerFrame", "Utility.GetRuntimeInstanceID",

@@ -35,10 +35,9 @@ class ValidityTest : public calmframe::host::HostRecords {
   }
   JobInput Input() { return ReadJobInput(&in_, &out_); }
   bool Current() {
-    PresentInputs present;
-    present.job_input = [this] { return Input(); };
-    present.tracker_identity = [this] { return GetIdentifierForTracker(selector_, {}); };
-    present.source_identity = [this] { return GetUpstreamIdentifier(&in_, &out_); };
+    const PresentInputs present = {[this] { return Input(); },
+                                   [this] { return GetIdentifierForTracker(selector_, {}); },
+                                   [this] { return GetUpstreamIdentifier(&in_, &out_); }};
     return IsAnalysisCurrent(state_, present, &out_);
   }
   int Status(std::int64_t frame) {
@@ -82,11 +81,10 @@ TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
 
 TEST_F(ValidityTest, ASourceThatChangedBackWhileAskedStaysCurrent) {
   const Guid stored = state_.result->source_identity, other = Guid::MakeUnique();
-  PresentInputs present;
-  present.job_input = [this] { return state_.result->job_input; };
-  present.tracker_identity = [this] { return state_.result->tracker_identity; };
   int asked = 0;
-  present.source_identity = [&] { return ++asked == 1 ? other : stored; };
+  PresentInputs present = {[this] { return state_.result->job_input; },
+                           [this] { return state_.result->tracker_identity; },
+                           [&] { return ++asked == 1 ? other : stored; }};
   EXPECT_TRUE(IsAnalysisCurrent(state_, present, &out_));
   EXPECT_EQ(state_.result->source_identity, other);
   asked = 0;
