@@ -63,7 +63,7 @@ PluginLibrary Linked() {
 
 }  // namespace
 
-HostedEffect::HostedEffect(const HostedSettings& settings) : settings_(settings) {
+HostedEffect::HostedEffect(const HostedSettings& settings) {
   keeps_deletions = settings.keeps_deletions;
   HostSettings host;
   host.media.cache_bytes = std::size_t{16} << 20;
@@ -217,7 +217,7 @@ void HostedEffect::SetDeletions(const std::vector<std::uint64_t>& keys) {
 
 // The effect may have put another value in the place of the last one.
 void HostedEffect::DisposeOfDeletions() {
-  if (!settings_.keeps_deletions) return;
+  if (!keeps_deletions) return;
   std::set<HX_Handle> values(deletions_.begin(), deletions_.end());
   for (const auto& effect : session_->effects()) {
     values.insert(effect->Param(deletions_index())->u.arb_d.value);

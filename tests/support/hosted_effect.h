@@ -154,7 +154,6 @@ class HostedEffect {
   explicit HostedEffect(const HostedSettings& settings);
   void DisposeOfDeletions();
 
-  const HostedSettings settings_;
   SolveStages stages_;
   // Used by the clip, which is drawn until the host has stopped.
   static constexpr std::int64_t kNoFrame = -1;

@@ -18,7 +18,6 @@ using calmframe::host::WorldBuffer;
 using kelp::effect::StabilizerEffect;
 using tesselui::drawbot::Color;
 using ::testing::ElementsAre;
-using Names = std::vector<std::string>;
 
 std::vector<int> Numbers(const BannerLayout& l) {
   return {l.text_width, l.text_height, l.band_width, l.band_height, l.band_top, l.text_x, l.text_y};
@@ -134,7 +133,7 @@ TEST_F(BannerTest, AnImageIsMadeOncePerStatusAndFailureText) {
     EXPECT_EQ(effect.GetBannerCache()->size(), 6u);
     const StatusRecord keyed{FrameStatus::GeneralFailure, "$$$/Key=Lost."};
     EXPECT_EQ(effect.GetBannerCache()->Get(keyed, "")->width(), BannerImage("Lost.", {}).width());
-    EXPECT_EQ(HostedEffect::OperationsOf([&] { draw(FrameStatus::None, ""); }), Names());
+    EXPECT_TRUE(HostedEffect::OperationsOf([&] { draw(FrameStatus::None, ""); }).empty());
     // Suite, world, band, copy of the text, text: each may fail.
     for (const char* name :
          {"acquire " HX_WORLD_SUITE, "World.NewWorld", "transfer", "copy_world"}) {

@@ -46,8 +46,6 @@ class VideoSegmentRenderSuiteJobTest : public calmframe::host::HostRecords {
   VideoSegmentRenderSuiteJobTest() : HostRecords([this](std::int64_t frame) { on_draw_(frame); }) {
     media().SetCacheBytes(0);
     media().faults.row_padding = 8;
-    input_.FieldType = 0;
-    input_.StepTime = {1, 25};
   }
   ~VideoSegmentRenderSuiteJobTest() override {
     for (CompletionEvent& held : held_) held.Signal();
@@ -106,7 +104,7 @@ class VideoSegmentRenderSuiteJobTest : public calmframe::host::HostRecords {
     Get(frame);
   }
 
-  analysis::JobInput input_;
+  analysis::JobInput input_ = {u"", {}, 0, {}, {}, {1, 25}};
   boost::shared_ptr<Job> job_;
   std::function<void(std::int64_t frame)> on_draw_ = [](std::int64_t) {};
   CompletionEvent held_[3];  // for on_draw_: draws go on
