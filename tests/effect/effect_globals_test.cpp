@@ -20,6 +20,7 @@ using calmframe::host::Operations;
 class EffectGlobalsTest : public calmframe::host::HostRecords {
  protected:
   EffectGlobalsTest() { in_.global_data = nullptr; }
+
   // The code that opening with these texts ends in.
   HX_Err Open(std::vector<const char*> literals) {
     literals_ = std::move(literals);
@@ -27,11 +28,6 @@ class EffectGlobalsTest : public calmframe::host::HostRecords {
     strings_ = {static_cast<std::uint32_t>(literals_.size()), 4700, literals_.data()};
     return Thrown([this] { OpenPlugin(context_, strings_); });
   }
-  std::string About() {
-    ShowAboutText(context_);
-    return out_.return_msg;
-  }
-
   calmframe::host::HandleStore& handles() { return hosted_.host().handles(); }
 
   std::vector<const char*> literals_;
@@ -53,7 +49,7 @@ TEST_F(EffectGlobalsTest, WhatWasOpenedIsToldInBothRecordsAndGoesFromBoth) {
   EXPECT_FALSE(in_.global_data);
   EXPECT_FALSE(out_.global_data);
   ClosePlugin(context_);
-  EXPECT_THROW(About(), std::int32_t);
+  EXPECT_THROW(ShowAboutText(context_), std::int32_t);
 }
 
 TEST_F(EffectGlobalsTest, AnOpeningThatFailsLeavesNothing) {
@@ -102,7 +98,8 @@ TEST_F(EffectGlobalsTest, ALongAboutTextIsCutBetweenCharacters) {
   for (int i = 0; i < 200; ++i) text += "\xF0\x9F\x8E\xA5";
   for (int i = 0; i < 62; ++i) expected += "\xF0\x9F\x8E\xA5";
   ASSERT_EQ(Open({text.c_str()}), 0);
-  EXPECT_EQ(About(), expected);
+  ShowAboutText(context_);
+  EXPECT_EQ(out_.return_msg, expected);
   ClosePlugin(context_);
 }
 
