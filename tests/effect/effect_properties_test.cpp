@@ -1,4 +1,3 @@
-#include <dlfcn.h>
 #include <elf.h>
 #include <gtest/gtest.h>
 #include <link.h>
@@ -9,8 +8,6 @@
 #include <string>
 #include <vector>
 
-#include "platform/hx/hx_effect.h"
-
 namespace {
 
 std::string Little(std::uint32_t value, int bytes) {
@@ -19,29 +16,8 @@ std::string Little(std::uint32_t value, int bytes) {
   return text;
 }
 
-// The record as a stranger finds it: by the symbol's name, as large as the symbol.
-class PropertyRecordTest : public testing::Test {
- protected:
-  void SetUp() override {
-    library_ = dlopen(PROBE_PLUGIN, RTLD_NOW | RTLD_LOCAL);
-    ASSERT_TRUE(library_) << dlerror();
-    const char* const record = static_cast<const char*>(dlsym(library_, "HXPL_16000"));
-    ASSERT_TRUE(record) << dlerror();
-    Dl_info info;
-    ElfW(Sym)* symbol = nullptr;
-    ASSERT_TRUE(dladdr1(record, &info, reinterpret_cast<void**>(&symbol), RTLD_DL_SYMENT));
-    ASSERT_STREQ(info.dli_sname, "HXPL_16000");
-    record_.assign(record, symbol->st_size);
-  }
-  void TearDown() override {
-    if (library_) dlclose(library_);
-  }
-
-  void* library_ = nullptr;
-  std::string record_;
-};
-
-TEST_F(PropertyRecordTest, TwelvePropertiesAndNothingElse) {
+// By its name it is found in every test that loads the plug-in.
+TEST(PropertyRecord, TwelvePropertiesFillASectionOfTheirOwn) {
   using namespace std::string_literals;
   const struct {
     const char* key;
@@ -65,19 +41,7 @@ TEST_F(PropertyRecordTest, TwelvePropertiesAndNothingElse) {
   for (const auto& [key, length, value] : properties) {
     expected += "XVN8"s + key + Little(0, 4) + Little(length, 4) + value;
   }
-  EXPECT_EQ(record_, expected);
-}
-
-TEST_F(PropertyRecordTest, NamesTheEntryThatAHostThenCalls) {
-  const auto entry = reinterpret_cast<HX_EffectMain>(dlsym(library_, "EffectMainExtra"));
-  ASSERT_TRUE(entry) << dlerror();
-  HX_OutData out{};
-  EXPECT_EQ(entry(0, nullptr, &out, nullptr, nullptr, nullptr), 0);
-  EXPECT_EQ(out.version, 1234u);
-}
-
-TEST_F(PropertyRecordTest, FillsASectionOfItsOwn) {
-  std::ifstream file(PROBE_PLUGIN, std::ios::binary);
+  std::ifstream file(CALMFRAME_PLUGIN, std::ios::binary);
   const std::string bytes((std::istreambuf_iterator<char>(file)), {});
   ElfW(Ehdr) header;
   ASSERT_GT(bytes.size(), sizeof(header));
@@ -92,7 +56,7 @@ TEST_F(PropertyRecordTest, FillsASectionOfItsOwn) {
       found.push_back(bytes.substr(section.sh_offset, section.sh_size));
     }
   }
-  EXPECT_EQ(found, std::vector<std::string>{record_});
+  EXPECT_EQ(found, std::vector<std::string>{expected});
 }
 
 }  // namespace

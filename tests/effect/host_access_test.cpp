@@ -3,12 +3,11 @@
 #include <functional>
 #include <string>
 
-#include "effect/handle.h"
 #include "effect/host_text.h"
 #include "effect/param_checkout.h"
 #include "effect/suite.h"
 #include "effect/world.h"
-#include "tests/effect/host_records.h"
+#include "tests/support/host_records.h"
 
 namespace kelp::effect {
 namespace {
@@ -18,10 +17,7 @@ using calmframe::host::Operations;
 
 constexpr char kNoSuite[] = "Not able to acquire OVK Suite.";
 
-class HostAccessTest : public calmframe::host::HostRecords {
- protected:
-  const HostContext context_ = RecordsOnly(&in_, &out_);
-};
+using HostAccessTest = calmframe::host::HostRecords;
 
 std::string asked;
 HX_Err Refuse(const char* name, std::int32_t version, const void**) {
@@ -29,15 +25,12 @@ HX_Err Refuse(const char* name, std::int32_t version, const void**) {
   return 1;
 }
 
-template <class Table>
+template <class Table, std::int32_t... version>
 void Ask(const HostContext& context) {
-  ScopedSuite<Table> suite(context);
-}
-template <class Table, std::int32_t version>
-void Ask(const HostContext& context) {
-  ScopedSuite<Table> suite(context, version);
+  ScopedSuite<Table> suite(context, version...);
 }
 
+// Those of the media are named by the tests of tests/host/timeline.
 TEST_F(HostAccessTest, EverySuiteIsThereAndMayBeRefused) {
   const std::pair<void (*)(const HostContext&), const char*> suites[] = {
       {Ask<HX_ParamUtilsSuite3>, "HX Param Utils Suite 3"},
@@ -48,16 +41,9 @@ TEST_F(HostAccessTest, EverySuiteIsThereAndMayBeRefused) {
       {Ask<HX_AppSuite6>, "HX OV App Suite 6"},
       {Ask<HX_AdvAppSuite1>, "HX OV Adv App Suite 1"},
       {Ask<HX_WorldSuite2>, "HX World Suite 2"},
-      {Ask<HX_StringSuite1>, "Rushbase StringSuite 1"},
       {Ask<HX_AnalysisHostSuite1>, "Analysis Host Suite 1"},
       {Ask<HX_StabilizerHostSuite7>, "Stabilizer Host Suite 7"},
       {Ask<HX_OpaqueEffectDataSuite1>, "Opaque Effect Data Suite 1"},
-      {Ask<HX_SequenceInfoSuite, 2>, "Rushbase Sequence Info Suite 2"},
-      {Ask<HX_SequenceInfoSuite, 3>, "Rushbase Sequence Info Suite 3"},
-      {Ask<HX_VideoSegmentSuite5>, "Rushbase Video Segment Suite 5"},
-      {Ask<HX_VideoSegmentRenderSuite3>, "Rushbase Video Segment Render Suite 3"},
-      {Ask<HX_CutPixSuite1>, "Cutline CutPix Suite 1"},
-      {Ask<HX_CutPixCacheSuite5>, "Cutline CutPix Cache Suite 5"},
       {Ask<HX_BlurSuite1>, "FLT Blur Suite 1"}};
   const HX_BasicSuite* const host = in_.basic;
   const HX_BasicSuite refusing = {Refuse, host->release};
@@ -74,40 +60,19 @@ TEST_F(HostAccessTest, EverySuiteIsThereAndMayBeRefused) {
   EXPECT_EQ(TakeMessage(), "No worlds.");
 }
 
+// Those of a planned frame are asked of whole renders, those of handles of the deleted tracks.
 TEST_F(HostAccessTest, RefusalsAreTheHostsCodes) {
-  const OwnedHandle handle(*in_.cb, std::uint64_t{8});
-  EXPECT_EQ(Thrown([&] { HandleLock guard(*in_.cb, nullptr); }), 3);
-  EXPECT_EQ(Thrown([&] { ParamCheckout param(context_, 2); }), HX_ERR_UNKNOWN);
-  const struct {
-    const char* operation;
-    std::function<void()> body;
-    HX_Err code;
-  } refusals[] = {
-      {"lock_handle", [&] { HandleLock guard(*in_.cb, handle.get()); }, 3},
-      {"new_handle", [&] { ThrowIfFailed(OwnedHandle(*in_.cb, std::uint64_t{8}) ? 0 : 55); }, 55},
-      {"checkout_param", [&] { ParamCheckout param(context_, 1); }, kFaultCode},
-      {"World.NewWorld", [&] { ScopedWorld w(context_, 4, 3, true, HX_FORMAT_ARGBF); }, kFaultCode},
-      {"Private Effect.ConvertText",
-       [&] {
-         char text[8];
-         ConvertToHostText(context_, "x", text, sizeof text);
-       },
-       kFaultCode}};
-  for (const auto& [operation, body, code] : refusals) {
+  EXPECT_EQ(Thrown([&] { ParamCheckout param(context_, 1000); }), HX_ERR_UNKNOWN);
+  char text[8];
+  const std::pair<const char*, std::function<void()>> refusals[] = {
+      {"checkout_param", [&] { ParamCheckout param(context_, 1); }},
+      {"World.NewWorld", [&] { ScopedWorld w(context_, 4, 3, true, HX_FORMAT_ARGBF); }},
+      {"Private Effect.ConvertText", [&] { ConvertToHostText(context_, "x", text, sizeof text); }}};
+  for (const auto& [operation, body] : refusals) {
     Operations::Get().FailNth(1, operation);
-    EXPECT_EQ(Thrown(body), code) << operation;
+    EXPECT_EQ(Thrown(body), kFaultCode) << operation;
     EXPECT_EQ(Thrown(body), 0) << operation;
   }
-}
-
-TEST_F(HostAccessTest, AFrameThatWasNotPlannedIsNotCheckedIn) {
-  HX_RenderExtra render{};
-  render.checkout_layer_pixels = [](HX_EffectRef, std::int32_t, HX_World**) -> HX_Err {
-    return 88;
-  };
-  HostContext context = context_;
-  context.extra = &render;
-  EXPECT_EQ(Thrown([&] { PlannedLayer layer(context, 6); }), 88);
 }
 
 TEST_F(HostAccessTest, ReportsNameTheFrameAndFailQuietly) {

@@ -27,23 +27,19 @@ class Reader final : public ParameterReader {
   }
 };
 
-TEST(ParameterReaderTest, AHiddenParameterIsItsDefaultAndTheHostIsNotAsked) {
-  const Reader reader;
+TEST(ParameterReaderTest, TheHostIsAskedByIndexAndNotForAHiddenParameter) {
+  Reader reader;
+  reader.value = 61.25;
   EXPECT_EQ(reader.GetFloatParam(7), 2.75);
   EXPECT_EQ(reader.GetIntParam(7), 2);
   EXPECT_EQ(reader.GetPopupParam(7), 2);
   EXPECT_TRUE(reader.GetBoolParam(7));
   EXPECT_EQ(reader.asked, 0);
-}
-
-TEST(ParameterReaderTest, TheHostIsAskedByIndexAndWhatIsNoIdIsOne) {
-  Reader reader;
-  reader.value = 61.25;
   EXPECT_EQ(reader.GetFloatParam(-100), 61.25);
   EXPECT_EQ(reader.asked, 3);
   EXPECT_EQ(reader.GetPopupParam(98), 61);
   EXPECT_EQ(reader.asked, 98);
-  EXPECT_THROW(reader.GetIntParam(-9969), std::int32_t);
+  EXPECT_THROW(reader.GetIntParam(-9969), std::int32_t);  // what is no id is an index
   EXPECT_EQ(reader.asked, -9969);
 }
 

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <mutex>
 #include <stdexcept>
 #include <string>
@@ -9,6 +8,7 @@
 #include <utility>
 
 #include "platform/tessel/debug.h"
+#include "platform/tessel/threads.h"
 
 namespace calmframe::host {
 
@@ -18,21 +18,12 @@ class Hold {
  public:
   // For the work: waits until it is let go.
   void Pass() {
-    std::unique_lock lock(mutex_);
-    reached_ = true;
-    changed_.notify_all();
-    changed_.wait(lock, [this] { return open_; });
+    reached_.Signal();
+    open_.Wait();
   }
   // Whether the work stands there within the time.
-  bool Reached(std::chrono::milliseconds time) {
-    std::unique_lock lock(mutex_);
-    return changed_.wait_for(lock, time, [this] { return reached_; });
-  }
-  void Release() {
-    std::lock_guard lock(mutex_);
-    open_ = true;
-    changed_.notify_all();
-  }
+  bool Reached(std::chrono::milliseconds time) { return reached_.WaitFor(time); }
+  void Release() { open_.Signal(); }
   // In a moment, and from another thread: whoever acts now waits for the work, if it must.
   std::jthread ReleaseSoon() {
     return std::jthread([this] {
@@ -42,9 +33,7 @@ class Hold {
   }
 
  private:
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  bool reached_ = false, open_ = false;  // guarded by mutex_
+  tessel::threads::CompletionEvent reached_, open_;
 };
 
 // Listens to the stages of solves, which their threads tell. One at a time.

@@ -1,10 +1,10 @@
 #include "tests/support/hosted_effect.h"
 
-#include <atomic>
 #include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstring>
 #include <set>
+#include <type_traits>
 
 #include "host/pixels/world_operations.h"
 #include "stabilizer/effect/src/instance_handle.h"
@@ -14,18 +14,11 @@
 
 // The plug-in's own, see stabilizer/effect/src/plugin_entry.cpp and renderer_exports.cpp.
 extern "C" {
-HX_Err EffectMainExtra(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef* params[],
-                       HX_World* output, void* extra);
-std::uint8_t allowCUDARendering(const void* block);
-const HX_VarVector* getOVVarVector(const void* block, std::int32_t frame);
-void getCropWindow(const void* block, std::int32_t frame, float* left, float* top, float* right,
-                   float* bottom);
-std::uint8_t getStabilizerData(const void* block, std::int32_t* frame_count,
-                               std::int32_t* first_frame, std::int32_t* grid_columns,
-                               std::int32_t* grid_rows, std::int32_t* crop_width,
-                               std::int32_t* crop_height, float* min_x, float* min_y, float* max_x,
-                               float* max_y, std::int32_t* source_width,
-                               std::int32_t* source_height);
+std::remove_pointer_t<HX_EffectMain> EffectMainExtra;
+std::remove_pointer_t<HX_AllowCUDARendering> allowCUDARendering;
+std::remove_pointer_t<HX_GetOVVarVector> getOVVarVector;
+std::remove_pointer_t<HX_GetCropWindow> getCropWindow;
+std::remove_pointer_t<HX_GetStabilizerData> getStabilizerData;
 }
 
 namespace calmframe::host {
@@ -37,7 +30,6 @@ using kelp::effect::StabilizerEffect;
 using namespace std::chrono_literals;
 
 constexpr std::int32_t kDeletionsDiskId = 305;
-constexpr std::int64_t kNoFrame = -1;
 
 // Of the one hosted effect; constant while renders are under way.
 bool keeps_deletions = false;
@@ -71,8 +63,7 @@ PluginLibrary Linked() {
 
 }  // namespace
 
-HostedEffect::HostedEffect(const HostedSettings& settings)
-    : settings_(settings), held_frame_(std::make_shared<std::atomic<std::int64_t>>(kNoFrame)) {
+HostedEffect::HostedEffect(const HostedSettings& settings) {
   keeps_deletions = settings.keeps_deletions;
   HostSettings host;
   host.media.cache_bytes = std::size_t{16} << 20;
@@ -91,13 +82,12 @@ HostedEffect::HostedEffect(const SourcePtr& source, const HostedSettings& settin
 HostedEffect::HostedEffect(const ShakyClip& clip, const HostedSettings& settings)
     : HostedEffect(settings) {
   ShakyClip held = clip;
-  held.on_draw = [this, draw = clip.on_draw, frames = held_frame_](std::int64_t frame) {
+  held.on_draw = [this, draw = clip.on_draw](std::int64_t frame) {
     if (draw) draw(frame);
-    if (*frames != frame) return;
     std::shared_ptr<Hold> hold;
     {
       const std::lock_guard lock(hold_mutex_);
-      hold = hold_;
+      if (frame == held_frame_) hold = hold_;
     }
     if (hold) hold->Pass();
   };
@@ -126,17 +116,6 @@ int HostedEffect::Settle() {
   return Status();
 }
 
-int HostedEffect::Analyse() {
-  EXPECT_TRUE(Apply().creation().ok());
-  return Settle();
-}
-
-SavedEffect HostedEffect::Save() {
-  SavedEffect saved;
-  EXPECT_TRUE(effect_->Save(&saved).ok());
-  return saved;
-}
-
 Effect& HostedEffect::Open(const SavedEffect& saved) {
   if (effect_) Remove();
   effect_ = &session_->Load(layer_, saved);
@@ -155,17 +134,9 @@ void HostedEffect::Place(std::int32_t start_frame, std::int32_t length) {
   });
 }
 
-void HostedEffect::Refuse(const std::string& why) {
-  layer_->Change([&](LayerState& state) { state.refusal = why; });
-}
-
 RenderedFrame HostedEffect::Render(const RenderRequest& request, Path path) {
   if (!renderer_) renderer_ = effect_->MakeRenderer();
   return path == Path::direct ? renderer_->Direct(request) : renderer_->Planned(request);
-}
-
-bool HostedEffect::Enabled(std::int32_t index) const {
-  return (effect_->Param(index)->ui_flags & HX_PARAM_UI_DISABLED) == 0;
 }
 
 std::vector<std::string> HostedEffect::OperationsOf(const std::function<void()>& act) {
@@ -182,14 +153,10 @@ std::vector<double> HostedEffect::Warp(std::int32_t frame) {
   return {warp->values, warp->values + 2 * std::ptrdiff_t{warp->columns} * warp->rows};
 }
 
-bool HostedEffect::AllowsOutside() {
-  return host_->library().exports().allow_cuda_rendering(effect_->opaque_data()) != 0;
-}
-
 void HostedEffect::HoldAtFrame(std::int64_t frame) {
   const std::lock_guard lock(hold_mutex_);
   hold_ = std::make_shared<Hold>();
-  *held_frame_ = frame;
+  held_frame_ = frame;
 }
 
 void HostedEffect::HoldSolve(const std::string& line) {
@@ -203,7 +170,8 @@ void HostedEffect::TickUntilHeld() {
 }
 
 void HostedEffect::Release() {
-  *held_frame_ = kNoFrame;
+  const std::lock_guard lock(hold_mutex_);
+  held_frame_ = kNoFrame;
   if (!hold_) return;
   stages_.HoldAt("", nullptr);
   hold_->Release();
@@ -211,8 +179,14 @@ void HostedEffect::Release() {
 
 // -- Deleted track points --
 
-std::int32_t HostedEffect::deletions_index() const {
-  return static_cast<std::int32_t>(host_->declarations().size()) - 1;
+HX_CustomDataExtra HostedEffect::DataExtra(std::int32_t op, HX_Handle a, HX_Handle b,
+                                           std::vector<std::uint64_t>* keys) {
+  HX_CustomDataExtra extra{op, kDeletionsDiskId, a, b, nullptr, 0, nullptr, 0.5, 99};
+  if (keys) {
+    extra.buffer = keys->data();
+    extra.size = static_cast<std::uint32_t>(keys->size() * sizeof(std::uint64_t));
+  }
+  return extra;
 }
 
 CommandResult HostedEffect::DataOp(HX_CustomDataExtra& extra) {
@@ -221,48 +195,35 @@ CommandResult HostedEffect::DataOp(HX_CustomDataExtra& extra) {
   return host_->Command(HX_CMD_CUSTOM_DATA_OP, in, out, nullptr, nullptr, &extra);
 }
 
-void HostedEffect::SetDeletions(const std::vector<std::uint64_t>& keys) {
-  std::vector<std::uint64_t> flat = keys;
-  HX_CustomDataExtra extra{};
-  extra.op = HX_DATA_UNFLATTEN;
-  extra.param_id = kDeletionsDiskId;
-  extra.buffer = flat.data();
-  extra.size = static_cast<std::uint32_t>(flat.size() * sizeof flat[0]);
-  EXPECT_TRUE(DataOp(extra).ok());
-  deletions_.push_back(extra.out);
-  HX_ParamDef param = *effect_->Param(deletions_index());
-  param.u.arb_d.value = extra.out;
-  EXPECT_TRUE(effect_->shared()->params().SetByPlugin(deletions_index(), param));
+HX_CustomDataExtra HostedEffect::DataOp(std::int32_t op, HX_Handle a, HX_Handle b,
+                                        std::vector<std::uint64_t>* keys) {
+  HX_CustomDataExtra extra = DataExtra(op, a, b, keys);
+  EXPECT_TRUE(DataOp(extra).ok()) << op;
+  return extra;
 }
 
-std::vector<std::uint64_t> HostedEffect::Deletions() {
-  HX_CustomDataExtra extra{};
-  extra.op = HX_DATA_FLAT_SIZE;
-  extra.param_id = kDeletionsDiskId;
-  extra.a = effect_->Param(deletions_index())->u.arb_d.value;
-  EXPECT_TRUE(DataOp(extra).ok());
-  std::vector<std::uint64_t> keys(extra.size / sizeof(std::uint64_t));
-  extra.op = HX_DATA_FLATTEN;
-  extra.buffer = keys.data();
-  EXPECT_TRUE(DataOp(extra).ok());
+std::vector<std::uint64_t> HostedEffect::DeletionsIn(HX_Handle value) {
+  std::vector<std::uint64_t> keys(DataOp(HX_DATA_FLAT_SIZE, value).size / sizeof(std::uint64_t));
+  DataOp(HX_DATA_FLATTEN, value, nullptr, &keys);
   return keys;
+}
+
+void HostedEffect::SetDeletions(const std::vector<std::uint64_t>& keys) {
+  deletions_.push_back(MakeDeletions(keys));
+  HX_ParamDef param = *effect_->Param(deletions_index());
+  param.u.arb_d.value = deletions_.back();
+  EXPECT_TRUE(effect_->shared()->params().SetByPlugin(deletions_index(), param));
 }
 
 // The effect may have put another value in the place of the last one.
 void HostedEffect::DisposeOfDeletions() {
-  if (!settings_.keeps_deletions) return;
+  if (!keeps_deletions) return;
   std::set<HX_Handle> values(deletions_.begin(), deletions_.end());
   for (const auto& effect : session_->effects()) {
     values.insert(effect->Param(deletions_index())->u.arb_d.value);
   }
   values.erase(nullptr);
-  for (const HX_Handle value : values) {
-    HX_CustomDataExtra extra{};
-    extra.op = HX_DATA_DISPOSE;
-    extra.param_id = kDeletionsDiskId;
-    extra.a = value;
-    EXPECT_TRUE(DataOp(extra).ok());
-  }
+  for (const HX_Handle value : values) DataOp(HX_DATA_DISPOSE, value);
 }
 
 // -- Past the host --

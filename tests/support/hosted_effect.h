@@ -2,7 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <functional>
@@ -54,7 +53,6 @@ class HostedEffect {
   Host& host() { return *host_; }
   Session& session() { return *session_; }
   Layer& layer() { return *layer_; }
-  const boost::shared_ptr<Layer>& shared_layer() const { return layer_; }
   // The one that was applied or opened last; there must be one.
   Effect& effect() { return *effect_; }
 
@@ -65,18 +63,28 @@ class HostedEffect {
   // Ticks until nothing is under way any more; the status then.
   int Settle();
   // Applied, analysed and solved; the status then.
-  int Analyse();
+  int Analyse() {
+    EXPECT_TRUE(Apply().creation().ok());
+    return Settle();
+  }
   CommandResult Set(std::int32_t index, double value) { return effect_->SetParam(index, value); }
   CommandResult Press(std::int32_t button) { return effect_->Press(button); }
   // The effect lives on.
-  SavedEffect Save();
+  SavedEffect Save() {
+    SavedEffect saved;
+    EXPECT_TRUE(effect_->Save(&saved).ok());
+    return saved;
+  }
   // The effect goes, and one out of a project takes its place.
   Effect& Open(const SavedEffect& saved);
   void Reopen() { Open(Save()); }
   void Remove();
   // What the layer shows of the source's frames.
   void Place(std::int32_t start_frame, std::int32_t length);
-  void Refuse(const std::string& why);  // the layer; not any more, for an empty text
+  // The layer; not any more, for an empty text.
+  void Refuse(const std::string& why) {
+    layer_->Change([&](LayerState& state) { state.refusal = why; });
+  }
 
   // -- What they see --
   RenderedFrame Render(const RenderRequest& request, Path path = Path::planned);
@@ -84,7 +92,9 @@ class HostedEffect {
     return Render(RenderRequest{frame, bit_depth}, path);
   }
   int Status() const { return Session::StatusOf(*effect_); }
-  bool Enabled(std::int32_t index) const;
+  bool Enabled(std::int32_t index) const {
+    return (effect_->Param(index)->ui_flags & HX_PARAM_UI_DISABLED) == 0;
+  }
   std::string Name(std::int32_t index) const { return effect_->Param(index)->name; }
   double Value(std::int32_t index) const { return *ValueOf(*effect_->Param(index)); }
   std::vector<std::string> Messages() { return effect_->TakeMessages(); }
@@ -98,7 +108,9 @@ class HostedEffect {
   // What a renderer outside of the plug-in sees: the frame's warp, x and y of each vertex, empty
   // without one; and whether it may draw.
   std::vector<double> Warp(std::int32_t frame);
-  bool AllowsOutside();
+  bool AllowsOutside() {
+    return host_->library().exports().allow_cuda_rendering(effect_->opaque_data()) != 0;
+  }
 
   // -- Work that stands still --
   // The analysis, where it wants that frame of the source.
@@ -114,10 +126,22 @@ class HostedEffect {
 
   // -- Track points that the user deleted, as a host keeps them: frame above slot --
   void SetDeletions(const std::vector<std::uint64_t>& keys);
-  std::vector<std::uint64_t> Deletions();
-  std::int32_t deletions_index() const;
-  // HX_CMD_CUSTOM_DATA_OP on the parameter.
+  std::vector<std::uint64_t> Deletions() {
+    return DeletionsIn(effect_->Param(deletions_index())->u.arb_d.value);
+  }
+  std::int32_t deletions_index() const {
+    return static_cast<std::int32_t>(host_->declarations().size()) - 1;
+  }
+  // HX_CMD_CUSTOM_DATA_OP on the parameter, for values that the caller disposes of.
+  static HX_CustomDataExtra DataExtra(std::int32_t op, HX_Handle a = nullptr, HX_Handle b = nullptr,
+                                      std::vector<std::uint64_t>* keys = nullptr);
   CommandResult DataOp(HX_CustomDataExtra& extra);
+  HX_CustomDataExtra DataOp(std::int32_t op, HX_Handle a = nullptr, HX_Handle b = nullptr,
+                            std::vector<std::uint64_t>* keys = nullptr);
+  HX_Handle MakeDeletions(std::vector<std::uint64_t> keys) {
+    return DataOp(HX_DATA_UNFLATTEN, nullptr, nullptr, &keys).out;
+  }
+  std::vector<std::uint64_t> DeletionsIn(HX_Handle value);
 
   // -- Past the host --
   // Runs `look` in place of the effect's next tick, in a call of the host's own.
@@ -130,12 +154,12 @@ class HostedEffect {
   explicit HostedEffect(const HostedSettings& settings);
   void DisposeOfDeletions();
 
-  const HostedSettings settings_;
   SolveStages stages_;
-  // Shared with the clip, which may be drawn until the host has stopped.
-  const std::shared_ptr<std::atomic<std::int64_t>> held_frame_;
-  std::shared_ptr<Hold> hold_;
+  // Used by the clip, which is drawn until the host has stopped.
+  static constexpr std::int64_t kNoFrame = -1;
   std::mutex hold_mutex_;
+  std::int64_t held_frame_ = kNoFrame;  // guarded by hold_mutex_
+  std::shared_ptr<Hold> hold_;          // guarded by hold_mutex_
   std::unique_ptr<Host> host_;
   std::unique_ptr<Session> session_;
   boost::shared_ptr<Layer> layer_;

@@ -22,10 +22,6 @@ void KeepTable(Kept& kept, const marrow::tracking::AllFeatures& table) {
   analysis::Replace(kept.result, [&](auto& result) { result.all_features = table; });
 }
 template <class Kept>
-void KeepFieldType(Kept& kept, std::int32_t field_type) {
-  analysis::Replace(kept.result, [&](auto& result) { result.job_input.FieldType = field_type; });
-}
-template <class Kept>
 void KeepWarps(Kept& kept, const boost::shared_ptr<const marrow::stabilization::CPWarper>& warper) {
   analysis::Replace(kept.solve_result, [&](auto& solve) { solve.warper = warper; });
 }

@@ -13,18 +13,10 @@ struct ShakyClip {
   int width = 320, height = 240;
   std::int64_t frames = 24;
   std::string name = "shaky clip";
-  double tremor = 1;                                     // times that of CameraX and CameraY
+  double tremor = 1;                                     // times that of the camera below
   HX_Ratio aspect = {1, 1};                              // of a pixel
   std::function<void(std::int64_t frame)> on_draw = {};  // on the thread that draws, first
 };
-
-// Where the camera of a shaky clip looks in a frame, in pixels: a pan with a tremor.
-inline double CameraX(std::int64_t frame) {
-  return 1.5 * static_cast<double>(frame) + 5.0 * std::sin(2.1 * static_cast<double>(frame));
-}
-inline double CameraY(std::int64_t frame) {
-  return 4.0 * std::sin(1.7 * static_cast<double>(frame) + 1.0);
-}
 
 // Value noise of a few scales over the plane, 0 to 1.
 inline double Noise(double x, double y) {
@@ -48,6 +40,7 @@ inline double Noise(double x, double y) {
   return sum;
 }
 
+// The camera pans and trembles.
 inline SourcePtr MakeShakyClip(const ShakyClip& clip = {}) {
   SourceInfo info;
   info.width = clip.width;
@@ -57,7 +50,9 @@ inline SourcePtr MakeShakyClip(const ShakyClip& clip = {}) {
   info.content = tessel::utility::Guid::FromText(clip.name);
   return MakeDrawnSource(info, [clip](std::int64_t frame, Picture& picture) {
     if (clip.on_draw) clip.on_draw(frame);
-    const double dx = clip.tremor * CameraX(frame), dy = clip.tremor * CameraY(frame);
+    const auto t = static_cast<double>(frame);
+    const double dx = clip.tremor * (1.5 * t + 5.0 * std::sin(2.1 * t)),
+                 dy = clip.tremor * (4.0 * std::sin(1.7 * t + 1.0));
     FillPicture(picture, [=](int x, int y) {
       const auto value = static_cast<float>(Noise(x + dx, y + dy));
       return HX_PixelFloat{1.0f, value, value * 0.8f, 1.0f - value};

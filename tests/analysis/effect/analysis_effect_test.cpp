@@ -87,10 +87,10 @@ TEST(AnalysisEffectTest, TheCurrentFrameIsTheLayersTimeBehindItsInPoint) {
     EXPECT_EQ(frame_at(c.start, c.time, c.clamped).frame, c.frame) << c.start << " " << c.time;
   }
   hosted.Inside([](StabilizerEffect& effect) {
-    KeepFieldType(*effect.GetState(), 1);  // rows are fields
-    auto table = TableOf(*effect.GetState());
-    table.frame_count = 40;
-    KeepTable(*effect.GetState(), table);
+    kelp::analysis::Replace(effect.GetState()->result, [](auto& result) {
+      result.job_input.FieldType = 1;  // rows are fields
+      result.all_features.frame_count = 40;
+    });
   });
   EXPECT_EQ(frame_at(10, 7, true).frame, 27);  // 7 half frames behind 2 * 10
   Operations::Get().FailAlways("Utility.GetStartFrame");

@@ -2,6 +2,8 @@
 
 #include <gmock/gmock.h>
 
+#include <array>
+
 #include "analysis/effect/banner_cache.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "tests/support/hosted_effect.h"
@@ -16,7 +18,6 @@ using calmframe::host::WorldBuffer;
 using kelp::effect::StabilizerEffect;
 using tesselui::drawbot::Color;
 using ::testing::ElementsAre;
-using Names = std::vector<std::string>;
 
 std::vector<int> Numbers(const BannerLayout& l) {
   return {l.text_width, l.text_height, l.band_width, l.band_height, l.band_top, l.text_x, l.text_y};
@@ -42,22 +43,15 @@ class BannerTest : public ::testing::Test {
  protected:
   BannerTest() { hosted_.Apply(); }
 
-  // In a call of the host's.
-  void Look(const std::function<void(StabilizerEffect& effect)>& look) { hosted_.Inside(look); }
-  // Blue, green, red, alpha of the flat or striped band, each as a drawing library may round it.
-  static std::vector<int> Bytes(const WorldBuffer& band, int x, int y) {
+  // Blue, green, red, as a drawing library may round them, and alpha.
+  static void ExpectPixel(const WorldBuffer& band, int x, int y, const std::array<int, 4>& bgra) {
     const auto* c = band.row<std::uint8_t>(y) + 4 * x;
-    return {c[0], c[1], c[2], c[3]};
+    for (int i = 0; i < 4; ++i) EXPECT_NEAR(c[i], bgra[i], i < 3) << x << " " << y;
   }
-  static auto Near(int b, int g, int r, int a) {
-    const auto near = [](int c) {
-      return ::testing::AllOf(::testing::Ge(c - 1), ::testing::Le(c + 1));
-    };
-    return ElementsAre(near(b), near(g), near(r), a);
-  }
-  static std::unique_ptr<WorldBuffer> Band(StabilizerEffect& effect, FrameStatus status) {
+  std::unique_ptr<WorldBuffer> Band(FrameStatus status) {
     Color first, second;
-    effect.GetBannerColors(status, &first, &second);
+    hosted_.Inside(
+        [&](StabilizerEffect& effect) { effect.GetBannerColors(status, &first, &second); });
     auto band = std::make_unique<WorldBuffer>(100, 48, HX_FORMAT_BGRA8);
     PaintBand(band->world(), first, second);
     return band;
@@ -66,42 +60,34 @@ class BannerTest : public ::testing::Test {
   HostedEffect hosted_{calmframe::host::SmallClip()};
 };
 
-TEST_F(BannerTest, WorkInProgressIsStripedAndTheRestIsFlat) {
-  Look([](StabilizerEffect& effect) {
-    const auto blue = Near(255, 64, 2, 204), dark = Near(204, 51, 2, 204);
-    auto band = Band(effect, FrameStatus::AnalysisInProgress);
-    // Stripes of 24 * 1.414 = 33.936 pixels, 32.936 apart from -1628.928 on, and 67.872 to the
-    // right from bottom to top: at x the bottom row is in stripe (x - 0.2 + 1628.9) / 32.936.
-    EXPECT_THAT(Bytes(*band, 0, 47), dark);   // 49.45
-    EXPECT_THAT(Bytes(*band, 30, 47), blue);  // 50.36
-    EXPECT_THAT(Bytes(*band, 60, 47), dark);  // 51.27
-    EXPECT_THAT(Bytes(*band, 0, 0), dark);    // 47.43, 66.7 further left
-    EXPECT_THAT(Bytes(*band, 30, 0), blue);   // 48.34
-    EXPECT_THAT(Bytes(*band, 99, 0), blue);   // 50.44
-    for (int y = 0; y < 48; ++y) {
-      for (int x = 0; x < 100; ++x) {  // no gap between stripes
-        const std::vector<int> p = Bytes(*band, x, y);
-        EXPECT_EQ(p[3], 204);
-        EXPECT_GE(p[0], 203) << x << " " << y;
-        EXPECT_NEAR(p[1], p[0] / 4, 2);
-      }
+// Which status has which colour, and what is flat, is asked of the plug-in in tests/contract.
+TEST_F(BannerTest, WorkInProgressIsStriped) {
+  const std::array<int, 4> blue = {255, 64, 2, 204}, dark = {204, 51, 2, 204};
+  auto band = Band(FrameStatus::AnalysisInProgress);
+  // Stripes of 24 * 1.414 = 33.936 pixels, 32.936 apart from -1628.928 on, and 67.872 to the
+  // right from bottom to top: at x the bottom row is in stripe (x - 0.2 + 1628.9) / 32.936.
+  ExpectPixel(*band, 0, 47, dark);   // 49.45
+  ExpectPixel(*band, 30, 47, blue);  // 50.36
+  ExpectPixel(*band, 60, 47, dark);  // 51.27
+  ExpectPixel(*band, 0, 0, dark);    // 47.43, 66.7 further left
+  ExpectPixel(*band, 30, 0, blue);   // 48.34
+  ExpectPixel(*band, 99, 0, blue);   // 50.44
+  for (int y = 0; y < 48; ++y) {
+    for (int x = 0; x < 100; ++x) {  // no gap between stripes
+      const auto* p = band->row<std::uint8_t>(y) + 4 * x;
+      EXPECT_EQ(p[3], 204);
+      EXPECT_GE(p[0], 203) << x << " " << y;
+      EXPECT_NEAR(p[1], p[0] / 4, 2);
     }
-    band = Band(effect, FrameStatus::SubsequentSolveOnDeletion);
-    EXPECT_THAT(Bytes(*band, 30, 47), Near(0, 85, 204, 51));
-    EXPECT_THAT(Bytes(*band, 60, 47), Near(0, 68, 163, 51));
-    for (const FrameStatus flat : {FrameStatus::TrackingFailed, FrameStatus::SolveFailed,
-                                   FrameStatus::GeneralFailure, FrameStatus::OverCropped}) {
-      band = Band(effect, flat);
-      for (const int x : {0, 30, 60}) EXPECT_THAT(Bytes(*band, x, 47), Near(0, 0, 197, 204));
-    }
-    band = Band(effect, FrameStatus::OutsideRange);
-    for (const int x : {0, 30, 60}) EXPECT_THAT(Bytes(*band, x, 47), blue);
-  });
+  }
+  band = Band(FrameStatus::SubsequentSolveOnDeletion);
+  ExpectPixel(*band, 30, 47, {0, 85, 204, 51});
+  ExpectPixel(*band, 60, 47, {0, 68, 163, 51});
 }
 
 // Depths, scales and paths are asked of the plug-in in tests/contract.
 TEST_F(BannerTest, TheTextIsWhiteAndNowhereButInItsPlace) {
-  Look([](StabilizerEffect& effect) {
+  hosted_.Inside([](StabilizerEffect& effect) {
     effect.context().in->width = 640;
     effect.context().in->height = 360;
     WorldBuffer output(640, 360, HX_FORMAT_ARGBF);
@@ -121,8 +107,6 @@ TEST_F(BannerTest, TheTextIsWhiteAndNowhereButInItsPlace) {
         if (u >= 0 && v >= 0 && u < layout.text_width && v < layout.text_height) {
           brightest = std::max(brightest, green);
         } else {
-          EXPECT_NEAR(ChannelAt(output, x, y, 0), 0.8, 0.004);
-          EXPECT_NEAR(ChannelAt(output, x, y, 1), 0.77255, 0.004);
           EXPECT_NEAR(green, 0, 0.004) << x << " " << y;
         }
       }
@@ -132,7 +116,7 @@ TEST_F(BannerTest, TheTextIsWhiteAndNowhereButInItsPlace) {
 }
 
 TEST_F(BannerTest, AnImageIsMadeOncePerStatusAndFailureText) {
-  Look([](StabilizerEffect& effect) {
+  hosted_.Inside([](StabilizerEffect& effect) {
     WorldBuffer output(96, 64, HX_FORMAT_ARGB8);
     const auto draw = [&](FrameStatus status, const char* text) {
       DrawBanner(effect, {status, text}, output.world());
@@ -149,7 +133,7 @@ TEST_F(BannerTest, AnImageIsMadeOncePerStatusAndFailureText) {
     EXPECT_EQ(effect.GetBannerCache()->size(), 6u);
     const StatusRecord keyed{FrameStatus::GeneralFailure, "$$$/Key=Lost."};
     EXPECT_EQ(effect.GetBannerCache()->Get(keyed, "")->width(), BannerImage("Lost.", {}).width());
-    EXPECT_EQ(HostedEffect::OperationsOf([&] { draw(FrameStatus::None, ""); }), Names());
+    EXPECT_TRUE(HostedEffect::OperationsOf([&] { draw(FrameStatus::None, ""); }).empty());
     // Suite, world, band, copy of the text, text: each may fail.
     for (const char* name :
          {"acquire " HX_WORLD_SUITE, "World.NewWorld", "transfer", "copy_world"}) {

@@ -3,8 +3,6 @@
 #include <gmock/gmock.h>
 
 #include <cstdlib>
-#include <cstring>
-#include <filesystem>
 
 #include "analysis/src/job_frame_source.h"
 #include "analysis/src/track_file.h"
@@ -51,7 +49,7 @@ TEST_F(AnalysisTest, TracksTheJobsFramesWhicheverWayUpTheyCome) {
   EXPECT_EQ(table.frame_count, 6);
   EXPECT_EQ(table.feature_count, 8);
   // Tracks there are, and they move with the picture.
-  const Cell* const cells = table.features->data();
+  const std::vector<Cell>& cells = *table.features;
   int carried = 0;
   for (int s = 0; s < 8; ++s) {
     bool whole = true;
@@ -111,14 +109,13 @@ TEST_F(AnalysisTest, DumpsEveryTrackBeforeShortOnesGo) {
   tracker.kill_tracks_shorter_than = 100;
   TableOf(ClipInput(3), false, tracker);
   const auto dumped = [&folder] {
-    std::string bytes = folder.Content("OVAnalysis_unquantized.trk");
+    const std::string bytes = folder.Content("OVAnalysis_unquantized.trk");
     // -11, the rows' first and end, the features of a row
     const std::string head("\xf5\xff\xff\xff\xff\xff\xff\xff\0\0\0\0\3\0\0\0\10\0\0\0", 20);
     EXPECT_EQ(bytes.substr(0, 20), head);
-    EXPECT_EQ(bytes.size(), 20u + 3 * 8 * 16);
-    bytes.resize(20 + 3 * 8 * 16);
     std::vector<Cell> cells(3 * 8);
-    std::memcpy(cells.data(), bytes.data() + 20, 3 * 8 * 16);
+    EXPECT_EQ(bytes.size(), 20u + 3 * 8 * 16);
+    bytes.copy(reinterpret_cast<char*>(cells.data()), 3 * 8 * 16, 20);
     return cells;
   };
   const Cell first = analysis_->all_features().features->front();
@@ -138,11 +135,8 @@ TEST_F(AnalysisTest, DumpsEveryTrackBeforeShortOnesGo) {
   unsetenv("TMPDIR");
 
   const std::vector<Cell> many(1500);
-  const std::string trk = folder.In("a.trk");
-  EXPECT_EQ(WriteTrackFile(trk, many.data(), 1500, 0, 3, 500), TrackFileResult::Written);
-  EXPECT_EQ(std::filesystem::file_size(trk), 24020u);
-  EXPECT_EQ(WriteTrackFile(trk, nullptr, 0, 0, 0, 0), TrackFileResult::Written);
-  EXPECT_EQ(std::filesystem::file_size(trk), 20u);
+  EXPECT_EQ(WriteTrackFile(folder.In("a.trk"), nullptr, 0, 0, 0, 0), TrackFileResult::Written);
+  EXPECT_EQ(folder.Content("a.trk").size(), 20u);
   EXPECT_EQ(WriteTrackFile(folder.In("no/a.trk"), nullptr, 0, 0, 0, 0), TrackFileResult::NotOpened);
   EXPECT_NE(WriteTrackFile("/dev/full", many.data(), 1500, 0, 3, 500), TrackFileResult::Written);
 }

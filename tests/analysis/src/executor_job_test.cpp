@@ -23,7 +23,7 @@ class ExecutorJobTest : public FakeJobTest {
       if (seen++ == n) interrupt(self, call);
     }));
   }
-  std::size_t CallsOfAWholeRun() { return Run(Make(ClipInput(3))).calls().size(); }
+  static constexpr std::size_t kCalls = 38;  // of a whole run
 };
 
 std::ptrdiff_t Count(const std::vector<std::string>& calls, const std::string& begin) {
@@ -56,9 +56,8 @@ TEST_F(ExecutorJobTest, TellsItsListenersEachStepAndEndsFinished) {
 // By the host's thread or in the middle of any operation: always finished, never failed, no fetch
 // begun any more, every frame held let go, and the host told.
 TEST_F(ExecutorJobTest, CancelledAtEveryCall) {
-  const std::size_t all = CallsOfAWholeRun();
-  ASSERT_EQ(all, 38u);
-  for (std::size_t n = 0; n < all - 1; ++n) {
+  ASSERT_EQ(Run(Make(ClipInput(3))).calls().size(), kCalls);
+  for (std::size_t n = 0; n < kCalls - 1; ++n) {
     std::string cancelled_at;
     FakeJob& job = RunWithAt(n, [&](FakeJob& self, const std::string& call) {
       self.Cancel();
@@ -79,11 +78,10 @@ TEST_F(ExecutorJobTest, CancelledAtEveryCall) {
 }
 
 TEST_F(ExecutorJobTest, FailingAtEveryCallForeseenOrNot) {
-  const std::size_t all = CallsOfAWholeRun();
-  for (std::size_t n = 1; n < all; ++n) {  // behind the start
-    const bool at_end = n >= all - 3;      // of a run that was whole
+  for (std::size_t n = 1; n < kCalls; ++n) {  // behind the start
+    const bool at_end = n >= kCalls - 3;      // of a run that was whole
     FakeJob& foreseen = RunWithAt(n, [](FakeJob& self, auto&) { self.Fail(kLiteral); });
-    if (n < all - 1) {
+    if (n < kCalls - 1) {
       EXPECT_EQ(foreseen.GetStatus().state, JobState::Failed) << n;
       EXPECT_EQ(foreseen.GetErrorText(), kLiteral) << n;
     }
@@ -121,14 +119,6 @@ TEST_F(ExecutorJobTest, CancelledBeforeItsThreadTakesItUp) {
   late.executor().EndQueue();
   late.Start(job_);
   EXPECT_EQ(late.GetStatus().state, JobState::Failed);
-}
-
-TEST_F(ExecutorJobTest, DropsItsOwnersOnItsOwnThread) {
-  Make(ClipInput(3)).Start(job_);
-  job_.reset();
-  analysis_.reset();
-  tessel::threads::Shutdown();  // waits for the run
-  EXPECT_EQ(FakeJob::living, 0);
 }
 
 }  // namespace

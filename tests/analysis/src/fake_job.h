@@ -21,12 +21,8 @@ constexpr std::int32_t kWidth = 48, kHeight = 40;
 
 // A clip of `frames` frames at 25 a second from `start` on.
 inline JobInput ClipInput(std::int64_t frames, std::int64_t start = 0, std::int32_t field = 0) {
-  JobInput input;
-  input.FieldType = field;
-  input.StepTime = {1, 25};
-  input.StartTime = input.StepTime * start;
-  input.Duration = input.StepTime * frames;
-  return input;
+  const RationalTime step = {1, 25};
+  return {u"", {}, field, step * start, step * frames, step};
 }
 
 // Settings under which the frames below give tracks, at little cost.

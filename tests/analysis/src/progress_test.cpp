@@ -7,12 +7,11 @@
 #include "analysis/src/analysis_state.h"
 #include "platform/tessel/utility.h"
 #include "tests/analysis/src/fake_job.h"
-#include "tests/effect/host_records.h"
+#include "tests/support/host_records.h"
 
 namespace kelp::analysis {
 namespace {
 
-using calmframe::host::Operations;
 using tessel::utility::HighPrecisionTime;
 
 // Says what the analyzer of a real one would when this row is finished.
@@ -96,11 +95,6 @@ TEST_F(ProgressTest, FramesForSixSecondsThenTimeForThree) {
     EXPECT_EQ(message.kind == ProgressKind::Frames, shows_frames) << at;
     EXPECT_EQ(clock.display_tick != 0, cycle_runs) << at;
   }
-}
-
-TEST_F(ProgressTest, HandsOnWhatTheHostAnswers) {
-  Operations::Get().FailNth(1, "Private Effect.ConvertText");
-  EXPECT_THROW(Text(10, 1), std::int32_t);
 }
 
 }  // namespace

@@ -5,7 +5,7 @@
 #include "analysis/src/identities.h"
 #include "analysis/src/read_job_input.h"
 #include "analysis/src/state_errors.h"
-#include "tests/effect/host_records.h"
+#include "tests/support/host_records.h"
 
 namespace kelp::analysis {
 namespace {
@@ -18,8 +18,8 @@ using tessel::utility::Guid;
 class ValidityTest : public calmframe::host::HostRecords {
  protected:
   ValidityTest() {
-    Place(10, 20);
-    analysis::Replace(state_.result, [this](AnalysisResult& result) {
+    hosted_.Place(10, 20);
+    Stored([this](AnalysisResult& result) {
       result.job_input = Input();
       result.tracker_identity = GetIdentifierForTracker(selector_, {});
       result.source_identity = GetUpstreamIdentifier(&in_, &out_);
@@ -28,27 +28,21 @@ class ValidityTest : public calmframe::host::HostRecords {
     });
   }
 
+  // Changes what was analysed.
+  template <class Change>
+  void Stored(const Change& change) {
+    Replace(state_.result, change);
+  }
   JobInput Input() { return ReadJobInput(&in_, &out_); }
   bool Current() {
-    PresentInputs present;
-    present.job_input = [this] { return Input(); };
-    present.tracker_identity = [this] { return GetIdentifierForTracker(selector_, {}); };
-    present.source_identity = [this] { return GetUpstreamIdentifier(&in_, &out_); };
+    const PresentInputs present = {[this] { return Input(); },
+                                   [this] { return GetIdentifierForTracker(selector_, {}); },
+                                   [this] { return GetUpstreamIdentifier(&in_, &out_); }};
     return IsAnalysisCurrent(state_, present, &out_);
   }
   int Status(std::int64_t frame) {
     const JobInput input = Input();
     return static_cast<int>(GetAnalysisStatus(state_, frame, &input));
-  }
-
-  // A field of what was analysed.
-  template <class Value>
-  void Set(Value AnalysisResult::*field, const Value& value) {
-    analysis::Replace(state_.result, [&](AnalysisResult& result) { result.*field = value; });
-  }
-  void SetFrames(std::int32_t count) {
-    analysis::Replace(state_.result,
-                      [&](AnalysisResult& r) { r.all_features.frame_count = count; });
   }
 
   AnalysisState state_;
@@ -57,11 +51,9 @@ class ValidityTest : public calmframe::host::HostRecords {
 
 TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
   EXPECT_TRUE(Current());
-  JobInput moved = state_.result->job_input;
-  moved.ProjectPath = u"/moved/since";
-  Set(&AnalysisResult::job_input, moved);
+  Stored([](AnalysisResult& result) { result.job_input.ProjectPath = u"/moved/since"; });
   EXPECT_TRUE(Current());
-  const LayerState layer = *layer_->state();
+  const LayerState before = *layer().state();
   const std::function<void(LayerState&)> changes[] = {
       [](LayerState& l) { l.length = 19; }, [](LayerState& l) { l.start_frame = 9; },
       [](LayerState& l) { l.field_type = 1; }, [](LayerState& l) { l.ticks_per_frame = 23543520; },
@@ -69,41 +61,30 @@ TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
         l.effects.insert(l.effects.begin(), {1000000, "blur", "", {}});
       }};
   for (const auto& change : changes) {
-    layer_->Change(change);
+    layer().Change(change);
     EXPECT_FALSE(Current());
-    layer_->Change([&](LayerState& l) { l = layer; });
+    layer().Change([&](LayerState& l) { l = before; });
     EXPECT_TRUE(Current());
   }
   selector_.spacing = 11;
   EXPECT_FALSE(Current());
-  selector_ = {};
-  const Guid source = state_.result->source_identity;
-  Set(&AnalysisResult::source_identity, Guid());
-  EXPECT_FALSE(Current());
-  Set(&AnalysisResult::source_identity, source);
-  SetFrames(0);
-  EXPECT_FALSE(Current());
-  SetFrames(20);
+  Stored([](AnalysisResult& result) { result.tracker_identity = {}; });  // of an old project
   EXPECT_TRUE(Current());
+  media().faults.node_missing = true;  // a source that can't be told is like no other
+  Stored([](AnalysisResult& result) { result.source_identity = {}; });
+  EXPECT_FALSE(Current());
+  Stored([](AnalysisResult& result) { result.all_features.frame_count = 0; });
   const auto asked = Operations::Get().count();
-  AnalysisState empty;
-  EXPECT_FALSE(IsAnalysisCurrent(empty, {[this] { return Input(); }, {}, {}}, &out_));
-  EXPECT_EQ(Operations::Get().count(), asked);     // nothing for it
-  Set(&AnalysisResult::tracker_identity, Guid());  // of an old project: not compared
-  selector_.spacing = 11;
-  EXPECT_TRUE(Current());
-  host_->media().faults.node_missing = true;  // a source that can't be told is like no other
-  Set(&AnalysisResult::source_identity, Guid());
-  EXPECT_FALSE(Current());
+  EXPECT_FALSE(IsAnalysisCurrent(state_, {[this] { return Input(); }, {}, {}}, &out_));
+  EXPECT_EQ(Operations::Get().count(), asked) << "nothing is asked for it";
 }
 
 TEST_F(ValidityTest, ASourceThatChangedBackWhileAskedStaysCurrent) {
   const Guid stored = state_.result->source_identity, other = Guid::MakeUnique();
-  PresentInputs present;
-  present.job_input = [this] { return state_.result->job_input; };
-  present.tracker_identity = [this] { return state_.result->tracker_identity; };
   int asked = 0;
-  present.source_identity = [&] { return ++asked == 1 ? other : stored; };
+  PresentInputs present = {[this] { return state_.result->job_input; },
+                           [this] { return state_.result->tracker_identity; },
+                           [&] { return ++asked == 1 ? other : stored; }};
   EXPECT_TRUE(IsAnalysisCurrent(state_, present, &out_));
   EXPECT_EQ(state_.result->source_identity, other);
   asked = 0;
@@ -121,7 +102,7 @@ TEST_F(ValidityTest, WhatCannotBeLearntIsStaleWithoutAMessage) {
     EXPECT_FALSE(Current()) << operation;
     EXPECT_EQ(TakeMessage(), "");
   }
-  layer_->Change([](LayerState& layer) { layer.refusal = "The layer is a still."; });
+  hosted_.Refuse("The layer is a still.");
   EXPECT_FALSE(Current());
   EXPECT_EQ(TakeMessage(), "");
 }
@@ -138,7 +119,7 @@ TEST_F(ValidityTest, StatusOfAFrame) {
       {10, 20, 1, 28224000, 14, 3}, {12, 5, 0, 23543520, 14, 3},  // within, but of a shorter step
   };
   for (const auto& [start, count, field, ticks, frame, status] : cases) {
-    layer_->Change([&](LayerState& layer) {
+    layer().Change([&](LayerState& layer) {
       layer.start_frame = start;
       layer.length = count;
       layer.field_type = field;
@@ -146,11 +127,9 @@ TEST_F(ValidityTest, StatusOfAFrame) {
     });
     EXPECT_EQ(Status(frame), status) << start << " " << count << " " << frame;
   }
-  JobInput other = state_.result->job_input;
-  other.FieldType = -1;
-  Set(&AnalysisResult::job_input, other);
+  Stored([](AnalysisResult& result) { result.job_input.FieldType = -1; });
   EXPECT_EQ(Status(14), 3);
-  SetFrames(0);
+  Stored([](AnalysisResult& result) { result.all_features.frame_count = 0; });
   EXPECT_EQ(Status(14), 1);
   state_.analysis_pending = true;
   EXPECT_EQ(Status(14), 4);
@@ -158,35 +137,30 @@ TEST_F(ValidityTest, StatusOfAFrame) {
 }
 
 TEST_F(ValidityTest, ReadsTheLayersSpan) {
-  const std::pair<std::int64_t, RationalTime> steps[] = {
-      {23543520, {1001, 30000}}, {29429400, {1001, 24000}}, {28224000, {1, 25}}};
-  for (const auto& [ticks, step] : steps) {
-    layer_->Change([ticks = ticks](LayerState& layer) { layer.ticks_per_frame = ticks; });
-    const JobInput input = Input();
-    EXPECT_TRUE(IdenticalTimes(input.StepTime, step)) << ticks;
-    EXPECT_EQ(FloorSteps(input.StartTime, step), 10);
-    EXPECT_EQ(FloorSteps(input.Duration, step), 20);
-  }
-  layer_->Change([](LayerState& layer) {
-    layer.start_frame = -5;
-    layer.field_type = 2;
+  layer().Change([](LayerState& state) { state.ticks_per_frame = 29429400; });
+  JobInput input = Input();
+  EXPECT_TRUE(IdenticalTimes(input.StepTime, {1001, 24000}));
+  EXPECT_EQ(FloorSteps(input.StartTime, input.StepTime), 10);
+  EXPECT_EQ(FloorSteps(input.Duration, input.StepTime), 20);
+  layer().Change([](LayerState& state) {
+    state.start_frame = -5;
+    state.field_type = 2;
   });
-  const JobInput input = Input();
+  input = Input();
   EXPECT_EQ(input.StartTime.numerator, 0);
   EXPECT_EQ(input.FieldType, 2);
   EXPECT_TRUE(input.ProjectPath.empty() && input.SourceID.IsNil());
 
-  HX_UtilitySuite utility = TableOf<HX_UtilitySuite>(HX_UTILITY_SUITE, 3);
-  utility.GetTicksPerFrame = [](HX_EffectRef, std::int64_t* ticks) -> HX_Err { return *ticks = 0; };
-  Replace(HX_UTILITY_SUITE, &utility);
+  Changed<HX_UtilitySuite>(HX_UTILITY_SUITE_VERSION_3).GetTicksPerFrame =
+      [](HX_EffectRef, std::int64_t* ticks) -> HX_Err { return *ticks = 0; };
   EXPECT_EQ(Thrown([this] { Input(); }), HX_ERR_UNKNOWN);
-  layer_->Change([](LayerState& layer) { layer.refusal = "Zu gro\u00df."; });
+  hosted_.Refuse("Zu gro\u00df.");
   EXPECT_EQ(Thrown([this] { Input(); }), 514);
   EXPECT_EQ(TakeMessage(), "Zu gro\u00df.");
 }
 
 TEST_F(ValidityTest, ASizeMismatchNamesLayerAndSizes) {
-  layer_->Change([](LayerState& layer) { layer.name = "Clip ^3"; });
+  layer().Change([](LayerState& layer) { layer.name = "Clip ^3"; });
   ReportSizeMismatch(&in_, &out_, "Calmframe", {1920, 1080}, {1280, 720}, AfterReport::GoOn);
   EXPECT_EQ(TakeMessage(),
             "Calmframe for layer \u201cClip ^3\u201d requires re-analysis because the source "
