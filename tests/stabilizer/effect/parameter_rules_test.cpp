@@ -56,15 +56,10 @@ TEST(ParameterRulesTest, SpacingKeepsFiveTimesTheSlotsApart) {
 }
 
 TEST(ParameterRulesTest, WindowsGrowWithTheHeight) {
-  for (const auto& [height, half] : {std::pair{300u, 7u},
-                                     {554, 7},
-                                     {555, 8},
-                                     {600, 8},
-                                     {630, 9},
-                                     {720, 10},
-                                     {1079, 14},
-                                     {1080, 15},
-                                     {2000, 15}}) {
+  constexpr std::pair<std::uint32_t, std::uint32_t> cases[] = {{300, 7},   {554, 7},   {555, 8},
+                                                               {600, 8},   {630, 9},   {720, 10},
+                                                               {1079, 14}, {1080, 15}, {2000, 15}};
+  for (const auto& [height, half] : cases) {
     EXPECT_EQ(WindowRule(height, false), half) << height;
     EXPECT_EQ(WindowRule(height, true), half + 5) << height;
   }

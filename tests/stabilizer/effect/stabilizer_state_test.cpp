@@ -18,53 +18,33 @@ boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height)
   return crop;
 }
 
-// A state of a 1920 x 1080 clip with that crop window.
-struct ZoomCase {
-  ZoomCase(std::int32_t width, std::int32_t height, Framing framing) {
-    values[kFramingIndex] = static_cast<int>(framing);
-    analysis::Replace(state.solve_result, [&](SolveResult& next) {
-      next.warper = ShiftingWarper(1920, 1080, {{0, 0}});
-      next.crop = Window(width, height);
-    });
-  }
-  double Zoom(bool auto_scale, bool additional) {
-    Renderer renderer(state.solve_result->warper->unionBounds(), 1920, 1080, 64, 36, 1, 1);
-    return state.GetZoom(values, renderer, auto_scale, additional);
-  }
-  bool OverCropped() { return state.IsOverCropped(values); }
-
-  ParameterValues values;
-  StabilizerState state{HX_InData{}, false};
-};
-
-TEST(StabilizerStateTest, ZoomIsOfTheScalesThatCount) {
-  EXPECT_EQ(ZoomCase(960, 540, Framing::crop_auto_scale).Zoom(true, true), 1.5);  // Maximum Scale
-  ZoomCase smaller(1700, 1000, Framing::crop);
-  smaller.values[kAdditionalScaleIndex] = 50;
-  EXPECT_EQ(smaller.Zoom(true, true), 0.5);
-  EXPECT_EQ(smaller.Zoom(true, false), 1.0);
-  EXPECT_EQ(smaller.Zoom(false, true), 0.5);
-}
-
-// By the window as it is shown, 1.5 times as large, if the framing crops.
-TEST(StabilizerStateTest, OverCropped) {
-  EXPECT_FALSE(ZoomCase(512, 288, Framing::crop_auto_scale).OverCropped());
-  EXPECT_TRUE(ZoomCase(511, 288, Framing::crop_auto_scale).OverCropped());
-  EXPECT_FALSE(ZoomCase(511, 288, Framing::stabilize_only).OverCropped());
+TEST(StabilizerStateTest, ZoomIsOfTheWindowAlone) {
+  ParameterValues values;  // whose Maximum Scale is 1.5
+  values[kAdditionalScaleIndex] = 50;
+  StabilizerState state({}, false);
+  state.solve_result = boost::make_shared<SolveResult>(
+      SolveResult{ShiftingWarper(1920, 1080, {{0, 0}}), Window(960, 540), 0, 0});
+  Renderer renderer(state.solve_result->warper->unionBounds(), 1920, 1080, 64, 36, 1, 1);
+  EXPECT_EQ(state.GetZoom(values, renderer, true, false), 1.5);
 }
 
 TEST(StabilizerStateTest, MarginInFramesRoundsHalvesUp) {
-  ParameterValues values;
-  values[kFramingIndex] = static_cast<int>(Framing::synthesize_edges);
-  EXPECT_EQ(MarginInFrames(values, 30), 15u);
-  EXPECT_EQ(MarginInFrames(values, 25), 13u);
-  EXPECT_EQ(MarginInFrames(values, 30000.0 / 1001), 15u);
-  values[kSynthesisInputRangeIndex] = 0.01;
-  EXPECT_EQ(MarginInFrames(values, 30), 0u);
-  values[kSynthesisInputRangeIndex] = 999;
-  EXPECT_EQ(MarginInFrames(values, 1e9), 2147483647u);
-  values[kFramingIndex] = static_cast<int>(Framing::crop);
-  EXPECT_EQ(MarginInFrames(values, 30), 0u);
+  const struct {
+    Framing framing;
+    double range, rate;
+    std::uint32_t frames;
+  } cases[] = {{Framing::synthesize_edges, 0.5, 30, 15},
+               {Framing::synthesize_edges, 0.5, 25, 13},
+               {Framing::synthesize_edges, 0.5, 30000.0 / 1001, 15},
+               {Framing::synthesize_edges, 0.01, 30, 0},
+               {Framing::synthesize_edges, 999, 1e9, 2147483647},
+               {Framing::crop, 999, 30, 0}};
+  for (const auto& c : cases) {
+    ParameterValues values;
+    values[kFramingIndex] = static_cast<int>(c.framing);
+    values[kSynthesisInputRangeIndex] = c.range;
+    EXPECT_EQ(MarginInFrames(values, c.rate), c.frames) << c.range << " at " << c.rate;
+  }
 }
 
 // -- What a state shares with renders, and what a project keeps of it --
