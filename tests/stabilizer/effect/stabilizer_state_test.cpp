@@ -18,7 +18,7 @@ boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height)
   return crop;
 }
 
-TEST(StabilizerStateTest, ZoomIsOfTheWindowAlone) {
+TEST(StabilizerStateRules, ZoomIsOfTheWindowAlone) {
   ParameterValues values;  // whose Maximum Scale is 1.5
   values[kAdditionalScaleIndex] = 50;
   StabilizerState state({}, false);
@@ -28,7 +28,7 @@ TEST(StabilizerStateTest, ZoomIsOfTheWindowAlone) {
   EXPECT_EQ(state.GetZoom(values, renderer, true, false), 1.5);
 }
 
-TEST(StabilizerStateTest, MarginInFramesRoundsHalvesUp) {
+TEST(StabilizerStateRules, MarginInFramesRoundsHalvesUp) {
   const struct {
     Framing framing;
     double range, rate;
@@ -74,15 +74,21 @@ void Fill(StabilizerState& state, std::int32_t first_frame) {
   state.progress.start_tick = 1234;
 }
 
+class StabilizerStateTest : public ::testing::Test {
+ protected:
+  StabilizerStateTest() { Fill(own, 7); }
+
+  StabilizerSharedData block;
+  StabilizerState own{{}, false};
+};
+
 auto SharedParts(const StabilizerState& state) {
   return std::tuple(state.source, state.result, state.solve_result, state.analyzer, state.phase,
                     state.needs_solve, state.subsequent_solve, state.first_analysis);
 }
 
-TEST(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
-  StabilizerSharedData block;
-  StabilizerState own({}, false), render({}, true);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
+  StabilizerState render({}, true);
   own.shared = render.shared = &block;
   render.TakeOver();
   EXPECT_FALSE(render.has_frames()) << "nothing is published";
@@ -97,10 +103,8 @@ TEST(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
   }
 }
 
-TEST(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
-  StabilizerSharedData block;
-  StabilizerState own({}, false), other({}, false);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
+  StabilizerState other({}, false);
   Fill(other, 8);
   own.shared = other.shared = &block;
   other.Publish(false);
@@ -116,9 +120,7 @@ TEST(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
   EXPECT_EQ(other.table().first_frame, 8) << "what is published is never written";
 }
 
-TEST(StabilizerStateTest, WhatIsSavedIsLoaded) {
-  StabilizerState own({}, false);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, WhatIsSavedIsLoaded) {
   for (const bool has_job : {true, false}) {
     own.needs_solve = has_job;
     SavedState saved = own.Save();
@@ -143,9 +145,7 @@ TEST(StabilizerStateTest, WhatIsSavedIsLoaded) {
 }
 
 // What does not fit is left out, or told to be of no parameters.
-TEST(StabilizerStateTest, ResultsAreSavedAsFarAsTheyStand) {
-  StabilizerState own({}, false);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, ResultsAreSavedAsFarAsTheyStand) {
   own.phase = SolvePhase::AnalysisFailed;
   auto saved = own.Save().solve_result;
   EXPECT_FALSE(saved->warper);

@@ -199,30 +199,5 @@ TEST(EdgeSynthesisTiles, ANeighbourThatReachesNothingOpenIsNotFetched) {
   EXPECT_EQ(pictures.asked, (Asked{0, 2, 3}));
 }
 
-TEST(TileMaps, RectanglesCoverTheSetOnce) {
-  std::mt19937 random(2);
-  for (int run = 0; run < 50; ++run) {
-    TileMap map(5 * TileMap::side + run % 30, 4 * TileMap::side - run % 7);
-    std::vector<int> covered(map.width() * map.height()), touched(covered);
-    for (int i = 0; i < run % 9; ++i) {
-      const int x = random() % map.width(), y = random() % map.height();
-      map.add(x - 1, y, x + random() % 60, y + 1 + random() % 40);
-    }
-    map.add(-50, -50, 0, 0);
-    map.add(10, 10, 10, 400);
-    for (const pixel_rect& r : map.rects()) {
-      for (int y = r.top; y < r.bottom; ++y) {
-        for (int x = r.left; x < r.right; ++x) ++covered.at(y * map.width() + x);
-      }
-    }
-    for (std::size_t i = 0; i < touched.size(); ++i) {
-      const int x = i % map.width(), y = i / map.width();
-      touched[i] = map.touches(x, y, x + 1, y + 1);
-    }
-    EXPECT_EQ(covered, touched);
-    EXPECT_EQ(map.empty(), map.rects().empty());
-  }
-}
-
 }  // namespace
 }  // namespace marrow::render
