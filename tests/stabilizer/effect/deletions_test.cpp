@@ -61,6 +61,13 @@ class DeletionsTest : public ::testing::Test {
     ASSERT_EQ(hosted.Settle(), 8);
     hosted.stages().Take();
   }
+  // Deletes them and no others, which is told and solved.
+  void Delete(const std::vector<std::uint64_t>& points) {
+    hosted.SetDeletions(points);
+    EXPECT_TRUE(hosted.Tick().ok());
+    EXPECT_EQ(hosted.Status(), 7);
+    EXPECT_EQ(hosted.Runs(), "factorization crop ");
+  }
   std::vector<std::vector<double>> Warps() {
     std::vector<std::vector<double>> all;
     for (std::int32_t f = 0; f < kFrames; ++f) all.push_back(hosted.Warp(f));
@@ -80,22 +87,15 @@ class DeletionsTest : public ::testing::Test {
 };
 
 TEST_F(DeletionsTest, WhatIsDeletedWasNeverThereAndUndoIsExact) {
-  hosted.SetDeletions(Walker());
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(hosted.Runs(), "factorization crop ");
+  Delete(Walker());
   const auto without = Warps();
   EXPECT_NE(without, first);
   EXPECT_EQ(StatusOf(kScene), kDeleted);
   EXPECT_EQ(hosted.Runs(), "") << "once is enough";
-  hosted.SetDeletions({});
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(hosted.Runs(), "factorization crop ");
+  Delete({});
   EXPECT_EQ(Warps(), first);
   EXPECT_EQ(StatusOf(kScene), 1) << "the analysis' own cells";
-  hosted.SetDeletions({std::uint64_t{kFrames} << 32, 9999});
-  EXPECT_EQ(hosted.Runs(), "factorization crop ") << "unknown points have a solve of their own";
+  Delete({std::uint64_t{kFrames} << 32, 9999});  // unknown points have a solve of their own
   EXPECT_EQ(Warps(), first);
   hosted.SetDeletions({});
   SolveTracks(false);
@@ -133,15 +133,11 @@ TEST_F(DeletionsTest, WithoutAnyTrackTheClipRestsUntilTheyComeBack) {
 }
 
 TEST_F(DeletionsTest, AProjectKnowsWhatItsSolveLeftOut) {
-  hosted.SetDeletions(Walker());
-  EXPECT_EQ(hosted.Runs(), "factorization crop ");
+  Delete(Walker());
   hosted.Save();  // and loaded where it stands
   const auto loaded = Warps();
   EXPECT_EQ(hosted.Runs(), "");
-  hosted.SetDeletions({});
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(hosted.Settle(), 8);
+  Delete({});
   EXPECT_NE(Warps(), loaded);
   EXPECT_EQ(StatusOf(kScene), 1);
 }

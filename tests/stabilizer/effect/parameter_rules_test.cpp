@@ -25,10 +25,6 @@ ParameterValues With(std::int32_t index, double value) {
   return values;
 }
 
-ParameterValues Detailed() {
-  return With(kDetailedAnalysisIndex, 1);
-}
-
 // "name value, " of each field.
 template <class Params>
 std::string FieldsOf(const Params& params) {
@@ -40,19 +36,20 @@ std::string FieldsOf(const Params& params) {
 }
 
 TEST(ParameterRulesTest, SpacingKeepsFiveTimesTheSlotsApart) {
+  const ParameterValues normal, detailed = With(kDetailedAnalysisIndex, 1);
   const struct {
     std::uint32_t width, height;
     std::uint64_t normal, detailed;
   } cases[] = {{640, 480, 11, 6},    {720, 576, 13, 6}, {1280, 720, 19, 10}, {1920, 1080, 29, 14},
                {3840, 2160, 58, 29}, {320, 240, 6, 4},  {64, 64, 4, 4}};
   for (const auto& c : cases) {
-    EXPECT_EQ(GetSelectorParams(ParameterValues(), c.width, c.height).spacing, c.normal) << c.width;
-    EXPECT_EQ(GetSelectorParams(Detailed(), c.width, c.height).spacing, c.detailed) << c.width;
+    EXPECT_EQ(GetSelectorParams(normal, c.width, c.height).spacing, c.normal) << c.width;
+    EXPECT_EQ(GetSelectorParams(detailed, c.width, c.height).spacing, c.detailed) << c.width;
   }
-  EXPECT_EQ(GetSelectorParams(ParameterValues(), 1920, 1080).max_count, 500u);
-  EXPECT_EQ(GetSelectorParams(Detailed(), 1920, 1080).max_count, 2000u);
-  EXPECT_EQ(GetTrackerParams(ParameterValues(), 1080).tolerance_min_correlation, 0.7);
-  EXPECT_EQ(GetTrackerParams(Detailed(), 1080).tolerance_min_correlation, 0.5);
+  EXPECT_EQ(GetSelectorParams(normal, 1920, 1080).max_count, 500u);
+  EXPECT_EQ(GetSelectorParams(detailed, 1920, 1080).max_count, 2000u);
+  EXPECT_EQ(GetTrackerParams(normal, 1080).tolerance_min_correlation, 0.7);
+  EXPECT_EQ(GetTrackerParams(detailed, 1080).tolerance_min_correlation, 0.5);
 }
 
 TEST(ParameterRulesTest, WindowsGrowWithTheHeight) {

@@ -152,6 +152,10 @@ TEST_F(SolveServiceTest, ControlsFollowTheParameters) {
   EXPECT_EQ(name.substr(0, 12), "Auto-scale (");
   EXPECT_EQ(name.substr(name.size() - 2), "%)");
   EXPECT_NEAR(std::stod(name.substr(12)), 110, 12);  // a shake of some pixels in 96
+  hosted.Set(kAdditionalScale, 50);
+  EXPECT_EQ(hosted.Name(kAutoScale), name) << "the window's alone";
+  hosted.RunsFor(kMaximumScale, 102);
+  EXPECT_EQ(hosted.Name(kAutoScale), "Auto-scale (102.0%)");
 
   const std::vector<std::int32_t> scales = {kAutoScale, kMaximumScale, kActionSafeMargin};
   const struct {

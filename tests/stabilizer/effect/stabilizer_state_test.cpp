@@ -5,49 +5,12 @@
 #include <boost/make_shared.hpp>
 #include <tuple>
 
-#include "tests/support/parameter_values.h"
+#include "tests/support/shaken_table.h"
 #include "tests/support/shifting_warper.h"
 
+// What a state shares with renders, and what a project keeps of it.
 namespace kelp::effect {
 namespace {
-
-boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height) {
-  const auto crop = boost::make_shared<cropper>(1, 1920, 1080);
-  crop->cropWidth = width;
-  crop->cropHeight = height;
-  return crop;
-}
-
-TEST(StabilizerStateRules, ZoomIsOfTheWindowAlone) {
-  ParameterValues values;  // whose Maximum Scale is 1.5
-  values[kAdditionalScaleIndex] = 50;
-  StabilizerState state({}, false);
-  state.solve_result = boost::make_shared<SolveResult>(
-      SolveResult{ShiftingWarper(1920, 1080, {{0, 0}}), Window(960, 540), 0, 0});
-  Renderer renderer(state.solve_result->warper->unionBounds(), 1920, 1080, 64, 36, 1, 1);
-  EXPECT_EQ(state.GetZoom(values, renderer, true, false), 1.5);
-}
-
-TEST(StabilizerStateRules, MarginInFramesRoundsHalvesUp) {
-  const struct {
-    Framing framing;
-    double range, rate;
-    std::uint32_t frames;
-  } cases[] = {{Framing::synthesize_edges, 0.5, 30, 15},
-               {Framing::synthesize_edges, 0.5, 25, 13},
-               {Framing::synthesize_edges, 0.5, 30000.0 / 1001, 15},
-               {Framing::synthesize_edges, 0.01, 30, 0},
-               {Framing::synthesize_edges, 999, 1e9, 2147483647},
-               {Framing::crop, 999, 30, 0}};
-  for (const auto& c : cases) {
-    ParameterValues values;
-    values[kFramingIndex] = static_cast<int>(c.framing);
-    values[kSynthesisInputRangeIndex] = c.range;
-    EXPECT_EQ(MarginInFrames(values, c.rate), c.frames) << c.range << " at " << c.rate;
-  }
-}
-
-// -- What a state shares with renders, and what a project keeps of it --
 
 using tessel::utility::Guid;
 
@@ -58,14 +21,11 @@ void Fill(StabilizerState& state, std::int32_t first_frame) {
     next.job_input.FieldType = 2;
     next.source_identity = Guid::MakeUnique();
     next.tracker_identity = Guid::MakeUnique();
-    next.all_features = {};
-    next.all_features.feature_count = 1;
-    next.all_features.frame_count = 1;
+    next.all_features = ShakenTable(1, 1);
     next.all_features.first_frame = first_frame;
-    next.all_features.features->resize(1);
   });
-  state.solve_result = boost::make_shared<SolveResult>(
-      SolveResult{ShiftingWarper(64, 36, {{0, 0}}), Window(9, 9), 77, 78});
+  state.solve_result = boost::make_shared<SolveResult>(SolveResult{
+      ShiftingWarper(64, 36, {{0, 0}}), boost::make_shared<cropper>(1, 66, 38), 77, 78});
   state.phase = SolvePhase::Solved;
   analysis::AnalyzerRecord job;
   job.tracker_guid = Guid::MakeUnique();
