@@ -62,6 +62,16 @@ class HostedEffect {
   CommandResult Tick() { return effect_->Tick(); }
   // Ticks until nothing is under way any more; the status then.
   int Settle();
+  // The stages that a solve runs until it is settled and well.
+  std::string Runs() {
+    EXPECT_EQ(Settle(), 8);
+    return stages_.Take();
+  }
+  // Of a change, and all that it leads to.
+  std::string RunsFor(std::int32_t index, double value) {
+    EXPECT_TRUE(Set(index, value).ok());
+    return Runs();
+  }
   // Applied, analysed and solved; the status then.
   int Analyse() {
     EXPECT_TRUE(Apply().creation().ok());

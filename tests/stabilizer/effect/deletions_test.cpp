@@ -38,11 +38,10 @@ class DeletionsTest : public ::testing::Test {
     return points;
   }
   static SourcePtr GreyClip() {
-    SourceInfo info;
-    info.width = 640;
-    info.height = 360;
-    info.frame_count = kFrames;
-    info.content = tessel::utility::Guid::FromText("grey");
+    const SourceInfo info{.width = 640,
+                          .height = 360,
+                          .frame_count = kFrames,
+                          .content = tessel::utility::Guid::FromText("grey")};
     return MakeDrawnSource(info, [](std::int64_t, Picture& picture) {
       FillPicture(picture, [](int, int) { return HX_PixelFloat{1, 0.5f, 0.5f, 0.5f}; });
     });
@@ -62,10 +61,12 @@ class DeletionsTest : public ::testing::Test {
     ASSERT_EQ(hosted.Settle(), 8);
     hosted.stages().Take();
   }
-  // What settling runs.
-  std::string Runs() {
-    EXPECT_EQ(hosted.Settle(), 8);
-    return hosted.stages().Take();
+  // Deletes them and no others, which is told and solved.
+  void Delete(const std::vector<std::uint64_t>& points) {
+    hosted.SetDeletions(points);
+    EXPECT_TRUE(hosted.Tick().ok());
+    EXPECT_EQ(hosted.Status(), 7);
+    EXPECT_EQ(hosted.Runs(), "factorization crop ");
   }
   std::vector<std::vector<double>> Warps() {
     std::vector<std::vector<double>> all;
@@ -86,22 +87,15 @@ class DeletionsTest : public ::testing::Test {
 };
 
 TEST_F(DeletionsTest, WhatIsDeletedWasNeverThereAndUndoIsExact) {
-  hosted.SetDeletions(Walker());
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(Runs(), "factorization crop ");
+  Delete(Walker());
   const auto without = Warps();
   EXPECT_NE(without, first);
   EXPECT_EQ(StatusOf(kScene), kDeleted);
-  EXPECT_EQ(Runs(), "") << "once is enough";
-  hosted.SetDeletions({});
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(Runs(), "factorization crop ");
+  EXPECT_EQ(hosted.Runs(), "") << "once is enough";
+  Delete({});
   EXPECT_EQ(Warps(), first);
   EXPECT_EQ(StatusOf(kScene), 1) << "the analysis' own cells";
-  hosted.SetDeletions({std::uint64_t{kFrames} << 32, 9999});
-  EXPECT_EQ(Runs(), "factorization crop ") << "unknown points have a solve of their own";
+  Delete({std::uint64_t{kFrames} << 32, 9999});  // unknown points have a solve of their own
   EXPECT_EQ(Warps(), first);
   hosted.SetDeletions({});
   SolveTracks(false);
@@ -132,22 +126,18 @@ TEST_F(DeletionsTest, WithoutAnyTrackTheClipRestsUntilTheyComeBack) {
   EXPECT_EQ(hosted.Settle(), 8);
   EXPECT_NE(Warps(), first);
   hosted.stages().Take();
-  EXPECT_EQ(Runs(), "") << "once is enough";
+  EXPECT_EQ(hosted.Runs(), "") << "once is enough";
   hosted.SetDeletions({});
   EXPECT_EQ(hosted.Settle(), 8);
   EXPECT_EQ(Warps(), first);
 }
 
 TEST_F(DeletionsTest, AProjectKnowsWhatItsSolveLeftOut) {
-  hosted.SetDeletions(Walker());
-  EXPECT_EQ(Runs(), "factorization crop ");
+  Delete(Walker());
   hosted.Save();  // and loaded where it stands
   const auto loaded = Warps();
-  EXPECT_EQ(Runs(), "");
-  hosted.SetDeletions({});
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Status(), 7);
-  EXPECT_EQ(hosted.Settle(), 8);
+  EXPECT_EQ(hosted.Runs(), "");
+  Delete({});
   EXPECT_NE(Warps(), loaded);
   EXPECT_EQ(StatusOf(kScene), 1);
 }

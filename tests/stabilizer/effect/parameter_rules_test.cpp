@@ -25,10 +25,6 @@ ParameterValues With(std::int32_t index, double value) {
   return values;
 }
 
-ParameterValues Detailed() {
-  return With(kDetailedAnalysisIndex, 1);
-}
-
 // "name value, " of each field.
 template <class Params>
 std::string FieldsOf(const Params& params) {
@@ -40,31 +36,27 @@ std::string FieldsOf(const Params& params) {
 }
 
 TEST(ParameterRulesTest, SpacingKeepsFiveTimesTheSlotsApart) {
+  const ParameterValues normal, detailed = With(kDetailedAnalysisIndex, 1);
   const struct {
     std::uint32_t width, height;
     std::uint64_t normal, detailed;
   } cases[] = {{640, 480, 11, 6},    {720, 576, 13, 6}, {1280, 720, 19, 10}, {1920, 1080, 29, 14},
                {3840, 2160, 58, 29}, {320, 240, 6, 4},  {64, 64, 4, 4}};
   for (const auto& c : cases) {
-    EXPECT_EQ(GetSelectorParams(ParameterValues(), c.width, c.height).spacing, c.normal) << c.width;
-    EXPECT_EQ(GetSelectorParams(Detailed(), c.width, c.height).spacing, c.detailed) << c.width;
+    EXPECT_EQ(GetSelectorParams(normal, c.width, c.height).spacing, c.normal) << c.width;
+    EXPECT_EQ(GetSelectorParams(detailed, c.width, c.height).spacing, c.detailed) << c.width;
   }
-  EXPECT_EQ(GetSelectorParams(ParameterValues(), 1920, 1080).max_count, 500u);
-  EXPECT_EQ(GetSelectorParams(Detailed(), 1920, 1080).max_count, 2000u);
-  EXPECT_EQ(GetTrackerParams(ParameterValues(), 1080).tolerance_min_correlation, 0.7);
-  EXPECT_EQ(GetTrackerParams(Detailed(), 1080).tolerance_min_correlation, 0.5);
+  EXPECT_EQ(GetSelectorParams(normal, 1920, 1080).max_count, 500u);
+  EXPECT_EQ(GetSelectorParams(detailed, 1920, 1080).max_count, 2000u);
+  EXPECT_EQ(GetTrackerParams(normal, 1080).tolerance_min_correlation, 0.7);
+  EXPECT_EQ(GetTrackerParams(detailed, 1080).tolerance_min_correlation, 0.5);
 }
 
 TEST(ParameterRulesTest, WindowsGrowWithTheHeight) {
-  for (const auto& [height, half] : {std::pair{300u, 7u},
-                                     {554, 7},
-                                     {555, 8},
-                                     {600, 8},
-                                     {630, 9},
-                                     {720, 10},
-                                     {1079, 14},
-                                     {1080, 15},
-                                     {2000, 15}}) {
+  constexpr std::pair<std::uint32_t, std::uint32_t> cases[] = {{300, 7},   {554, 7},   {555, 8},
+                                                               {600, 8},   {630, 9},   {720, 10},
+                                                               {1079, 14}, {1080, 15}, {2000, 15}};
+  for (const auto& [height, half] : cases) {
     EXPECT_EQ(WindowRule(height, false), half) << height;
     EXPECT_EQ(WindowRule(height, true), half + 5) << height;
   }

@@ -30,30 +30,25 @@ class ParameterTableTest : public ::testing::Test {
         {4, "check"}, {7, "popup"}, {10, "float"}, {13, "start"}, {14, "end"}, {15, "button"}};
     const HX_ParamDef def = Def(index);
     const HX_ParamValue& u = def.u;
-    std::string valid, slider, preset, tolerance, decimals, count, text, generic;
+    std::string own, generic;
     if (def.kind == HX_PARAM_FLOAT_SLIDER) {
-      valid = Text(u.fs.valid_min, "..", u.fs.valid_max);
-      slider = Text(u.fs.slider_min, "..", u.fs.slider_max);
-      preset = Text(u.fs.default_value);
-      decimals = Text(u.fs.precision, '/', u.fs.display);
-      tolerance = Text(u.fs.tolerance);
+      own = Text(u.fs.valid_min, "..", u.fs.valid_max, ';', u.fs.slider_min, "..", u.fs.slider_max,
+                 ';', u.fs.default_value, ';', u.fs.tolerance, ';', u.fs.precision, '/',
+                 u.fs.display);
     } else if (def.kind == HX_PARAM_POPUP) {
-      preset = Text(u.pd.default_value);
-      count = Text(u.pd.count);
-      text = u.pd.items;
+      own = Text(u.pd.default_value, ';', u.pd.count, ';', u.pd.items);
     } else if (def.kind == HX_PARAM_CHECKBOX) {
-      preset = Text(u.bd.default_value);
+      own = Text(u.bd.default_value);
     } else if (def.kind == HX_PARAM_BUTTON) {
-      text = u.button.label;
+      own = u.button.label;
     }
     for (std::int32_t id = -10000; id < -9969; ++id) {
       if (ParamIdToIndex(id) == index) generic += Text(id);
     }
     const char* const shown = IsExperimentalIndex(index) ? "experimental" : "always";
     return Text(index, ';', def.disk_id, ';', shown, ';', kinds.at(def.kind), ';', std::hex,
-                def.flags, std::dec, ';', def.ui_flags, ';', def.name, ';', valid, ';', slider, ';',
-                preset, ';', ValueOf(def), ';', tolerance, ';', decimals, ';', count, ';', text,
-                ';', generic);
+                def.flags, std::dec, ';', def.ui_flags, ';', def.name, ';', ValueOf(def), ';',
+                generic, ';', own);
   }
 
   const tessel::config::StringTable strings_{StabilizerStringTable().literals,

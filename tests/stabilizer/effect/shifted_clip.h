@@ -39,11 +39,10 @@ class ShiftedClipTest : public ::testing::Test {
   void Load(const boost::shared_ptr<const marrow::stabilization::CPWarper>& warper,
             const Values& controls, const Colour& colour = Ramp,
             const std::function<void(kelp::effect::SavedState& state)>& change = {}) {
-    SourceInfo info;
-    info.width = kWidth;
-    info.height = kHeight;
-    info.frame_count = warper->frameCount();
-    info.content = tessel::utility::Guid::MakeUnique();
+    const SourceInfo info{.width = kWidth,
+                          .height = kHeight,
+                          .frame_count = warper->frameCount(),
+                          .content = tessel::utility::Guid::MakeUnique()};
     hosted_.emplace(MakeDrawnSource(info, [colour](std::int64_t frame, Picture& picture) {
       FillPicture(picture, [&](int x, int y) { return colour(frame, x, y); });
     }));
@@ -61,9 +60,7 @@ class ShiftedClipTest : public ::testing::Test {
 
   // All that there is to show, of a frame of the layer.
   static RenderRequest Whole(std::int64_t frame, int depth = 8, std::uint32_t half = 1) {
-    RenderRequest request{frame, depth, {1, half}};
-    request.part = HX_Rect{-100, -100, 200, 200};
-    return request;
+    return {frame, depth, {1, half}, HX_Rect{-100, -100, 200, 200}};
   }
   std::shared_ptr<WorldBuffer> Draw(const RenderRequest& request, Path path = Path::planned) {
     const RenderedFrame frame = hosted_->Render(request, path);
@@ -80,14 +77,12 @@ class ShiftedClipTest : public ::testing::Test {
     return planned;
   }
   static bool Same(const WorldBuffer& a, const WorldBuffer& b) {
-    const HX_Rect first = a.rect(), second = b.rect();
-    if (std::memcmp(&first, &second, sizeof first) != 0) return false;
-    const auto row_bytes =
-        static_cast<std::size_t>(a.world().width) * BytesPerPixel(a.world().format);
-    for (int y = 0; y < a.world().height; ++y) {
-      if (std::memcmp(a.row<char>(y), b.row<char>(y), row_bytes) != 0) return false;
+    bool same = Sides(a.rect()) == Sides(b.rect());
+    for (int y = 0; same && y < a.world().height; ++y) {
+      same = std::memcmp(a.row<char>(y), b.row<char>(y),
+                         a.world().width * BytesPerPixel(a.world().format)) == 0;
     }
-    return true;
+    return same;
   }
   // By places of the layer: the source's column and row that are shown there.
   static void ExpectShown(const WorldBuffer& pixels, int x, int y, double column, double row) {
@@ -104,18 +99,6 @@ class ShiftedClipTest : public ::testing::Test {
     const auto names = HostedEffect::OperationsOf([&] { Draw(Whole(frame)); });
     return static_cast<std::size_t>(std::count(names.begin(), names.end(), "plan.checkout_layer"));
   }
-  // Makes each operation of a render fail in turn, until one comes through; `check` gets the name.
-  void FailEachOperation(const RenderRequest& request, Path path,
-                         const std::function<void(const std::string& name, HX_Err code)>& check) {
-    Draw(request, path);  // makes the renderer
-    const auto names = HostedEffect::OperationsOf([&] { Draw(request, path); });
-    for (std::size_t n = 1; n <= names.size(); ++n) {
-      Operations::Get().FailNth(static_cast<std::int64_t>(n));
-      check(names[n - 1], hosted_->Render(request, path).result.code);
-      Operations::Get().FailNone();
-    }
-  }
-
   HostedEffect& hosted() { return *hosted_; }
 
  private:

@@ -24,12 +24,6 @@ class SolveServiceTest : public ::testing::Test {
     ASSERT_EQ(hosted.Analyse(), 8);
     hosted.stages().Take();
   }
-  // The stages that a change, and all that it leads to, runs.
-  std::string RunsFor(std::int32_t index, double value) {
-    EXPECT_TRUE(hosted.Set(index, value).ok());
-    EXPECT_EQ(hosted.Settle(), 8);
-    return hosted.stages().Take();
-  }
   // Statuses that the host was told.
   int Told() const { return static_cast<int>(hosted.Value(kStatusCounter)) / 100; }
 
@@ -49,7 +43,7 @@ TEST_F(SolveServiceTest, HashesDecideWhatAChangeCallsFor) {
                  {kResult, 2, all}};
   for (const auto& c : changes) {
     const std::vector<double> before = hosted.Warp(3);
-    EXPECT_EQ(RunsFor(c.index, c.value), c.runs) << c.index;
+    EXPECT_EQ(hosted.RunsFor(c.index, c.value), c.runs) << c.index;
     EXPECT_EQ(hosted.Warp(3) != before, c.runs == all) << c.index;
   }
   EXPECT_EQ(hosted.Info().first, "") << "a later solve clears the panel";
@@ -62,17 +56,17 @@ TEST_F(SolveServiceTest, EdgeSynthesisWantsAFrameMapThatIsWideEnough) {
     return frames;
   };
   const std::vector<double> warp = hosted.Warp(3);
-  EXPECT_EQ(RunsFor(kSynthesisInputRange, 0.12), "");
-  EXPECT_EQ(RunsFor(kFraming, 4), "") << "no crop either";
+  EXPECT_EQ(hosted.RunsFor(kSynthesisInputRange, 0.12), "");
+  EXPECT_EQ(hosted.RunsFor(kFraming, 4), "") << "no crop either";
   EXPECT_EQ(radius(), 3u);  // frames in 0.12 seconds at 25
   const int told = Told();
-  EXPECT_EQ(RunsFor(kSynthesisInputRange, 0.05), "");
+  EXPECT_EQ(hosted.RunsFor(kSynthesisInputRange, 0.05), "");
   EXPECT_EQ(radius(), 3u) << "the map at hand will do";
   EXPECT_EQ(Told(), told);
-  EXPECT_EQ(RunsFor(kSynthesisInputRange, 0.2), "");
+  EXPECT_EQ(hosted.RunsFor(kSynthesisInputRange, 0.2), "");
   EXPECT_EQ(radius(), 5u);
   EXPECT_GT(Told(), told);
-  EXPECT_EQ(RunsFor(kFraming, 3), "crop ");
+  EXPECT_EQ(hosted.RunsFor(kFraming, 3), "crop ");
   EXPECT_EQ(radius(), 0u);
   EXPECT_EQ(hosted.Warp(3), warp);
 }
@@ -84,8 +78,11 @@ TEST_F(SolveServiceTest, WarpsOfAnotherAnalysisAreNotReused) {
       change(*effect.GetState());
       effect.MarkNeedsSolve();
     });
-    EXPECT_EQ(hosted.Settle(), 8);
-    return hosted.stages().Take();
+    return hosted.Runs();
+  };
+  const auto keep = [](int width, int height, std::size_t frames) {
+    const std::vector<marrow::stabilization::point2> shifts(frames);
+    return [=](StabilizerState& state) { KeepWarps(state, ShiftingWarper(width, height, shifts)); };
   };
   EXPECT_EQ(run([](StabilizerState&) {}), "crop ");
   const struct {
@@ -96,17 +93,9 @@ TEST_F(SolveServiceTest, WarpsOfAnotherAnalysisAreNotReused) {
       {"new tracks", [](StabilizerState& state) { state.MakeResultIdentityUnique(); }},
       {"a start that failed",
        [](StabilizerState& state) { state.phase = kelp::effect::SolvePhase::AnalysisFailed; }},
-      {"a frame less",
-       [](StabilizerState& state) {
-         KeepWarps(state, ShiftingWarper(96, 64, {7, {0, 0}}));
-       }},
-      {"another width",
-       [](StabilizerState& state) {
-         KeepWarps(state, ShiftingWarper(95, 64, {8, {0, 0}}));
-       }},
-      {"another height", [](StabilizerState& state) {
-         KeepWarps(state, ShiftingWarper(96, 63, {8, {0, 0}}));
-       }}};
+      {"a frame less", keep(96, 64, 7)},
+      {"another width", keep(95, 64, 8)},
+      {"another height", keep(96, 63, 8)}};
   for (const auto& c : cases) {
     EXPECT_EQ(run(c.change), "factorization crop ") << c.name;
     EXPECT_EQ(run([](StabilizerState&) {}), "crop ") << c.name;
@@ -120,10 +109,9 @@ TEST_F(SolveServiceTest, AFailedFramingLeavesNoWarpsToGoOnWith) {
   EXPECT_TRUE(hosted.Warp(3).empty());
   hosted.stages().FailAt("");
   hosted.stages().Take();
-  for (int i = 0; i < 3; ++i) EXPECT_TRUE(hosted.Tick().ok());
+  EXPECT_EQ(hosted.Settle(), 10);
   EXPECT_EQ(hosted.stages().Take(), "") << "it isn't tried again by itself";
-  EXPECT_EQ(hosted.Status(), 10);
-  EXPECT_EQ(RunsFor(kMaximumScale, 200), "factorization crop ");
+  EXPECT_EQ(hosted.RunsFor(kMaximumScale, 200), "factorization crop ");
 }
 
 TEST_F(SolveServiceTest, ASolveAtWorkIsKeptAndShowsThatItLives) {
@@ -164,6 +152,10 @@ TEST_F(SolveServiceTest, ControlsFollowTheParameters) {
   EXPECT_EQ(name.substr(0, 12), "Auto-scale (");
   EXPECT_EQ(name.substr(name.size() - 2), "%)");
   EXPECT_NEAR(std::stod(name.substr(12)), 110, 12);  // a shake of some pixels in 96
+  hosted.Set(kAdditionalScale, 50);
+  EXPECT_EQ(hosted.Name(kAutoScale), name) << "the window's alone";
+  hosted.RunsFor(kMaximumScale, 102);
+  EXPECT_EQ(hosted.Name(kAutoScale), "Auto-scale (102.0%)");
 
   const std::vector<std::int32_t> scales = {kAutoScale, kMaximumScale, kActionSafeMargin};
   const struct {
@@ -198,9 +190,7 @@ TEST_F(SolveServiceTest, AtAnotherSizeNothingIsSolvedUntilItIsTheOldOne) {
   EXPECT_EQ(hosted.stages().Take(), "");
   EXPECT_EQ(hosted.Messages().size(), 1u);
   hosted.layer().Resize(96, 64);
-  EXPECT_TRUE(hosted.Tick().ok());
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
+  EXPECT_EQ(hosted.Runs(), "factorization crop ");
 }
 
 }  // namespace

@@ -11,74 +11,65 @@
 namespace calmframe::host {
 namespace {
 
-using kelp::analysis::FrameStatus;
 using kelp::effect::SolvePhase;
 using kelp::effect::StabilizerEffect;
 using kelp::effect::StabilizerState;
 
 // Of frames 5 to 12 of the source.
 TEST(StabilizerEffectTest, StatusOfAFrame) {
+  using enum kelp::analysis::FrameStatus;
   HostedEffect hosted(SmallClip("statuses", 20));
   hosted.Place(5, 8);
   ASSERT_EQ(hosted.Analyse(), 8);
   // After a change of what the instance keeps; where the layer stands is looked up with each call.
-  const auto expect = [&](std::int64_t frame, FrameStatus status,
+  const auto expect = [&](std::int64_t frame, kelp::analysis::FrameStatus status,
                           const std::function<void(StabilizerEffect&, StabilizerState&)>& change) {
     hosted.Inside([&](StabilizerEffect& effect) {
       change(effect, *effect.GetState());
       EXPECT_EQ(effect.GetStatusForFrame(frame), status) << frame;
     });
   };
-  const auto none = [](StabilizerEffect&, StabilizerState&) {};
-  expect(5, FrameStatus::Ready, none);
-  expect(12, FrameStatus::SolveInProgress, [](StabilizerEffect& effect, StabilizerState& state) {
+  const auto none = [](auto&, auto&) {};
+  expect(5, Ready, none);
+  expect(12, SolveInProgress, [](auto& effect, auto& state) {
     effect.MarkNeedsSolve();
     state.first_analysis = true;
   });
-  expect(12, FrameStatus::SubsequentSolve,
-         [](auto&, StabilizerState& state) { state.first_analysis = false; });
-  expect(12, FrameStatus::SubsequentSolveOnDeletion,
-         [](auto&, StabilizerState& state) { state.subsequent_solve = true; });
-  expect(12, FrameStatus::SubsequentSolve,
-         [](StabilizerEffect& effect, auto&) { effect.MarkNeedsSolve(); });
+  expect(12, SubsequentSolve, [](auto&, auto& state) { state.first_analysis = false; });
+  expect(12, SubsequentSolveOnDeletion, [](auto&, auto& state) { state.subsequent_solve = true; });
+  expect(12, SubsequentSolve, [](auto& effect, auto&) { effect.MarkNeedsSolve(); });
   for (const std::int64_t outside : {4, 13}) {
-    expect(outside, FrameStatus::OutsideRange, none);
-    expect(outside, FrameStatus::TrackingFailed,
-           [](StabilizerEffect& effect, auto&) { effect.MarkAnalysisFailed(); });
-    expect(outside, FrameStatus::OutsideRange,
-           [](auto&, StabilizerState& state) { state.phase = SolvePhase::None; });
+    expect(outside, OutsideRange, none);
+    expect(outside, TrackingFailed, [](auto& effect, auto&) { effect.MarkAnalysisFailed(); });
+    expect(outside, OutsideRange, [](auto&, auto& state) { state.phase = SolvePhase::None; });
   }
-  expect(5, FrameStatus::SolveFailed,
-         [](auto&, StabilizerState& state) { state.phase = SolvePhase::Failed; });
+  expect(5, SolveFailed, [](auto&, auto& state) { state.phase = SolvePhase::Failed; });
   hosted.Place(5, 10);
-  expect(5, FrameStatus::SolveFailed, none);
-  expect(5, FrameStatus::RangeChanged, [](auto&, StabilizerState& state) {
+  expect(5, SolveFailed, none);
+  expect(5, RangeChanged, [](auto&, auto& state) {
     state.phase = SolvePhase::Solved;
     state.needs_solve = false;
   });
   hosted.Place(6, 4);
-  expect(6, FrameStatus::Ready, none);
-  expect(6, FrameStatus::OverCropped, [](StabilizerEffect& effect, StabilizerState& state) {
+  expect(6, Ready, none);
+  expect(6, OverCropped, [](auto& effect, auto& state) {
     KeepCrop(state, boost::make_shared<cropper>(1, 96, 64));
-    EXPECT_TRUE(effect.IsFinishedStatus(FrameStatus::OverCropped));
+    EXPECT_TRUE(effect.IsFinishedStatus(OverCropped));
   });
   hosted.Set(kFraming, 1);
-  expect(6, FrameStatus::Ready, none);
-  expect(6, FrameStatus::AnalysisInProgress,
-         [](auto&, StabilizerState& state) { state.analysis_pending = true; });
+  expect(6, Ready, none);
+  expect(6, AnalysisInProgress, [](auto&, auto& state) { state.analysis_pending = true; });
   hosted.Refuse("No footage.");
-  expect(6, FrameStatus::GeneralFailure,
-         [](auto&, StabilizerState& state) { state.analysis_pending = false; });
+  expect(6, GeneralFailure, [](auto&, auto& state) { state.analysis_pending = false; });
   hosted.Inside([](StabilizerEffect& effect) {
-    const kelp::analysis::effect::StatusRecord told{FrameStatus::GeneralFailure, "No footage."};
+    const kelp::analysis::effect::StatusRecord told{GeneralFailure, "No footage."};
     EXPECT_EQ(effect.GetStatusRecord(), told);
     EXPECT_FALSE(effect.IsRenderableFrame());
   });
   EXPECT_TRUE(hosted.Messages().empty()) << "the banner tells it";
   hosted.Refuse("");
-  expect(6, FrameStatus::PressAnalyze, [](auto&, StabilizerState& state) { KeepTable(state, {}); });
-  expect(6, FrameStatus::TrackingFailed,
-         [](StabilizerEffect& effect, auto&) { effect.MarkAnalysisFailed(); });
+  expect(6, PressAnalyze, [](auto&, auto& state) { KeepTable(state, {}); });
+  expect(6, TrackingFailed, [](auto& effect, auto&) { effect.MarkAnalysisFailed(); });
 }
 
 TEST(StabilizerEffectTest, AnalyzeStartsAnewAndDropsWhatWasSolved) {
@@ -92,8 +83,7 @@ TEST(StabilizerEffectTest, AnalyzeStartsAnewAndDropsWhatWasSolved) {
   EXPECT_EQ(hosted.Status(), 4);
   EXPECT_TRUE(hosted.Warp(3).empty());
   hosted.stages().Take();
-  EXPECT_EQ(hosted.Settle(), 8);
-  EXPECT_EQ(hosted.stages().Take(), "factorization crop ");
+  EXPECT_EQ(hosted.Runs(), "factorization crop ");
   EXPECT_FALSE(hosted.Warp(9).empty());
 }
 

@@ -5,69 +5,12 @@
 #include <boost/make_shared.hpp>
 #include <tuple>
 
-#include "tests/support/parameter_values.h"
+#include "tests/support/shaken_table.h"
 #include "tests/support/shifting_warper.h"
 
+// What a state shares with renders, and what a project keeps of it.
 namespace kelp::effect {
 namespace {
-
-boost::shared_ptr<const cropper> Window(std::int32_t width, std::int32_t height) {
-  const auto crop = boost::make_shared<cropper>(1, 1920, 1080);
-  crop->cropWidth = width;
-  crop->cropHeight = height;
-  return crop;
-}
-
-// A state of a 1920 x 1080 clip with that crop window.
-struct ZoomCase {
-  ZoomCase(std::int32_t width, std::int32_t height, Framing framing) {
-    values[kFramingIndex] = static_cast<int>(framing);
-    analysis::Replace(state.solve_result, [&](SolveResult& next) {
-      next.warper = ShiftingWarper(1920, 1080, {{0, 0}});
-      next.crop = Window(width, height);
-    });
-  }
-  double Zoom(bool auto_scale, bool additional) {
-    Renderer renderer(state.solve_result->warper->unionBounds(), 1920, 1080, 64, 36, 1, 1);
-    return state.GetZoom(values, renderer, auto_scale, additional);
-  }
-  bool OverCropped() { return state.IsOverCropped(values); }
-
-  ParameterValues values;
-  StabilizerState state{HX_InData{}, false};
-};
-
-TEST(StabilizerStateTest, ZoomIsOfTheScalesThatCount) {
-  EXPECT_EQ(ZoomCase(960, 540, Framing::crop_auto_scale).Zoom(true, true), 1.5);  // Maximum Scale
-  ZoomCase smaller(1700, 1000, Framing::crop);
-  smaller.values[kAdditionalScaleIndex] = 50;
-  EXPECT_EQ(smaller.Zoom(true, true), 0.5);
-  EXPECT_EQ(smaller.Zoom(true, false), 1.0);
-  EXPECT_EQ(smaller.Zoom(false, true), 0.5);
-}
-
-// By the window as it is shown, 1.5 times as large, if the framing crops.
-TEST(StabilizerStateTest, OverCropped) {
-  EXPECT_FALSE(ZoomCase(512, 288, Framing::crop_auto_scale).OverCropped());
-  EXPECT_TRUE(ZoomCase(511, 288, Framing::crop_auto_scale).OverCropped());
-  EXPECT_FALSE(ZoomCase(511, 288, Framing::stabilize_only).OverCropped());
-}
-
-TEST(StabilizerStateTest, MarginInFramesRoundsHalvesUp) {
-  ParameterValues values;
-  values[kFramingIndex] = static_cast<int>(Framing::synthesize_edges);
-  EXPECT_EQ(MarginInFrames(values, 30), 15u);
-  EXPECT_EQ(MarginInFrames(values, 25), 13u);
-  EXPECT_EQ(MarginInFrames(values, 30000.0 / 1001), 15u);
-  values[kSynthesisInputRangeIndex] = 0.01;
-  EXPECT_EQ(MarginInFrames(values, 30), 0u);
-  values[kSynthesisInputRangeIndex] = 999;
-  EXPECT_EQ(MarginInFrames(values, 1e9), 2147483647u);
-  values[kFramingIndex] = static_cast<int>(Framing::crop);
-  EXPECT_EQ(MarginInFrames(values, 30), 0u);
-}
-
-// -- What a state shares with renders, and what a project keeps of it --
 
 using tessel::utility::Guid;
 
@@ -78,14 +21,11 @@ void Fill(StabilizerState& state, std::int32_t first_frame) {
     next.job_input.FieldType = 2;
     next.source_identity = Guid::MakeUnique();
     next.tracker_identity = Guid::MakeUnique();
-    next.all_features = {};
-    next.all_features.feature_count = 1;
-    next.all_features.frame_count = 1;
+    next.all_features = ShakenTable(1, 1);
     next.all_features.first_frame = first_frame;
-    next.all_features.features->resize(1);
   });
-  state.solve_result = boost::make_shared<SolveResult>(
-      SolveResult{ShiftingWarper(64, 36, {{0, 0}}), Window(9, 9), 77, 78});
+  state.solve_result = boost::make_shared<SolveResult>(SolveResult{
+      ShiftingWarper(64, 36, {{0, 0}}), boost::make_shared<cropper>(1, 66, 38), 77, 78});
   state.phase = SolvePhase::Solved;
   analysis::AnalyzerRecord job;
   job.tracker_guid = Guid::MakeUnique();
@@ -94,15 +34,21 @@ void Fill(StabilizerState& state, std::int32_t first_frame) {
   state.progress.start_tick = 1234;
 }
 
+class StabilizerStateTest : public ::testing::Test {
+ protected:
+  StabilizerStateTest() { Fill(own, 7); }
+
+  StabilizerSharedData block;
+  StabilizerState own{{}, false};
+};
+
 auto SharedParts(const StabilizerState& state) {
   return std::tuple(state.source, state.result, state.solve_result, state.analyzer, state.phase,
                     state.needs_solve, state.subsequent_solve, state.first_analysis);
 }
 
-TEST(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
-  StabilizerSharedData block;
-  StabilizerState own({}, false), render({}, true);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
+  StabilizerState render({}, true);
   own.shared = render.shared = &block;
   render.TakeOver();
   EXPECT_FALSE(render.has_frames()) << "nothing is published";
@@ -117,10 +63,8 @@ TEST(StabilizerStateTest, ARenderTakesOverAllThatWasPublished) {
   }
 }
 
-TEST(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
-  StabilizerSharedData block;
-  StabilizerState own({}, false), other({}, false);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
+  StabilizerState other({}, false);
   Fill(other, 8);
   own.shared = other.shared = &block;
   other.Publish(false);
@@ -136,9 +80,7 @@ TEST(StabilizerStateTest, AUserInterfaceInstanceKeepsItsTracksAndItsAnalyzer) {
   EXPECT_EQ(other.table().first_frame, 8) << "what is published is never written";
 }
 
-TEST(StabilizerStateTest, WhatIsSavedIsLoaded) {
-  StabilizerState own({}, false);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, WhatIsSavedIsLoaded) {
   for (const bool has_job : {true, false}) {
     own.needs_solve = has_job;
     SavedState saved = own.Save();
@@ -163,9 +105,7 @@ TEST(StabilizerStateTest, WhatIsSavedIsLoaded) {
 }
 
 // What does not fit is left out, or told to be of no parameters.
-TEST(StabilizerStateTest, ResultsAreSavedAsFarAsTheyStand) {
-  StabilizerState own({}, false);
-  Fill(own, 7);
+TEST_F(StabilizerStateTest, ResultsAreSavedAsFarAsTheyStand) {
   own.phase = SolvePhase::AnalysisFailed;
   auto saved = own.Save().solve_result;
   EXPECT_FALSE(saved->warper);

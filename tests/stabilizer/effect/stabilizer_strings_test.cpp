@@ -3,8 +3,8 @@
 #include <gtest/gtest.h>
 
 #include <fstream>
+#include <sstream>
 #include <string>
-#include <vector>
 
 #include "analysis/effect/analysis_strings.h"
 
@@ -12,22 +12,23 @@ namespace kelp::effect {
 namespace {
 
 // As the lines of stabilizer_strings.txt have them: what the text is for, and the keyed literal.
-std::vector<std::string> EveryText() {
-  std::vector<std::string> lines;
+TEST(StabilizerStringsTest, EveryTextAndItsKey) {
+  std::ostringstream lines;
   const auto add = [&lines](const std::string& place, const char* literal) {
-    if (literal) lines.push_back(place + ';' + literal);
+    if (literal) lines << place << ';' << literal << '\n';
   };
   const HX_StringTable& table = StabilizerStringTable();
+  EXPECT_EQ(table.count, 40u);  // the last one ends the table
   for (std::uint32_t i = 0; i < table.count; ++i) {
     add(std::to_string(table.number) + '/' + std::to_string(i), table.literals[i]);
   }
-  for (int status = -1; status < 20; ++status) {
-    add("status " + std::to_string(status), StabilizerStatusLiteral(status));
-  }
-  for (int status = -1; status < 20; ++status) {
-    add("status " + std::to_string(status) + " of an analysis",
-        analysis::effect::AnalysisStatusLiteral(status));
-  }
+  const auto add_statuses = [&add](const char* of, const char* (*literal)(std::int32_t)) {
+    for (int status = -1; status < 20; ++status) {
+      add("status " + std::to_string(status) + of, literal(status));
+    }
+  };
+  add_statuses("", StabilizerStatusLiteral);
+  add_statuses(" of an analysis", analysis::effect::AnalysisStatusLiteral);
   add("effect name", kEffectName);
   add("auto-scale readout", kAutoScaleReadout);
   add("version too old", kVersionTooOld);
@@ -35,15 +36,9 @@ std::vector<std::string> EveryText() {
   add("bad data", kBadSerializedData);
   add("grid mismatch", kGridMismatch);
   add("cancel button", analysis::effect::kCancelButtonInitializing);
-  return lines;
-}
-
-TEST(StabilizerStringsTest, EveryTextAndItsKey) {
-  std::ifstream file(CALMFRAME_TABLES "/stabilizer_strings.txt");
-  std::vector<std::string> expected;
-  for (std::string line; std::getline(file, line);) expected.push_back(line);
-  EXPECT_EQ(EveryText(), expected);
-  EXPECT_EQ(StabilizerStringTable().count, 40u);  // the last one ends the table
+  std::ostringstream expected;
+  expected << std::ifstream(CALMFRAME_TABLES "/stabilizer_strings.txt").rdbuf();
+  EXPECT_EQ(lines.str(), expected.str());
 }
 
 }  // namespace

@@ -12,17 +12,6 @@
 namespace calmframe::host {
 namespace {
 
-// Little-endian: version, flags, slot, payload length, and 7 bytes that nobody uses.
-std::string FlatHandle(std::uint32_t version, std::uint64_t length, const std::string& payload) {
-  std::string bytes(24 + payload.size() + 7, '\0');
-  std::memcpy(bytes.data(), &version, 4);
-  bytes[4] = 1;
-  std::memset(bytes.data() + 8, 0xee, 8);  // a pointer of another process
-  std::memcpy(bytes.data() + 16, &length, 8);
-  std::memcpy(bytes.data() + 24, payload.data(), payload.size());
-  return bytes;
-}
-
 std::string BytesOf(const SavedEffect& saved) {
   return {saved.instance.begin(), saved.instance.end()};
 }
@@ -36,19 +25,7 @@ class StoredServiceTest : public ::testing::Test {
  protected:
   void Solve(int framing) {
     hosted.Apply();
-    hosted.Set(kFraming, framing);
-    ASSERT_EQ(hosted.Settle(), 8);
-    hosted.stages().Take();
-  }
-  std::string RunsFor(std::int32_t index, double value) {
-    EXPECT_TRUE(hosted.Set(index, value).ok());
-    EXPECT_EQ(hosted.Settle(), 8);
-    return hosted.stages().Take();
-  }
-  // The effect's, after it was loaded where it stands.
-  SavedEffect SaveInTheMiddle() {
-    const std::jthread release = hosted.ReleaseSoon();  // a save waits for the solve to stop
-    return hosted.Save();
+    EXPECT_NE(hosted.RunsFor(kFraming, framing), "");
   }
 
   HostedEffect hosted{SmallClip(), {.keeps_analysis_raw = true}};
@@ -61,14 +38,13 @@ TEST_F(StoredServiceTest, ASolvedEffectComesBackBitForBitAndHasNothingToDo) {
     const std::vector<double> warp = hosted.Warp(3);
     hosted.Open(saved);
     EXPECT_EQ(hosted.Warp(3), warp);
-    EXPECT_EQ(hosted.Settle(), 8);
-    EXPECT_EQ(hosted.stages().Take(), "");
+    EXPECT_EQ(hosted.Runs(), "");
     const SavedEffect again = hosted.Save();
     EXPECT_TRUE(again.instance == saved.instance);
     EXPECT_EQ(again.values, saved.values) << "not even the counter";
     // A wider map needs tracks, and so does another path.
     const bool edges = framing == 4;
-    EXPECT_EQ(RunsFor(edges ? kSynthesisInputRange : kSmoothness, edges ? 0.7 : 20),
+    EXPECT_EQ(hosted.RunsFor(edges ? kSynthesisInputRange : kSmoothness, edges ? 0.7 : 20),
               edges ? "factorization " : "factorization crop ");
     hosted.Remove();
   }
@@ -77,13 +53,7 @@ TEST_F(StoredServiceTest, ASolvedEffectComesBackBitForBitAndHasNothingToDo) {
 // And keeps what it had until the new results are there. A framing alone needs no more than the
 // stored warps.
 TEST_F(StoredServiceTest, SavedInTheMiddleOfASolveItSolves) {
-  hosted.Apply();
-  hosted.Set(kFraming, 1);
-  hosted.HoldSolve();
-  hosted.TickUntilHeld();
-  hosted.Open(SaveInTheMiddle());
-  EXPECT_TRUE(hosted.Warp(3).empty());
-  EXPECT_EQ(hosted.Settle(), 8);
+  Solve(1);
   const struct {
     const char* held_at;
     std::int32_t index;
@@ -97,11 +67,13 @@ TEST_F(StoredServiceTest, SavedInTheMiddleOfASolveItSolves) {
     hosted.HoldSolve(c.held_at);
     hosted.Set(c.index, c.value);
     hosted.TickUntilHeld();
-    hosted.Open(SaveInTheMiddle());
+    {
+      const std::jthread release = hosted.ReleaseSoon();  // a save waits for the solve to stop
+      hosted.Reopen();
+    }
     hosted.stages().Take();
     EXPECT_EQ(hosted.Warp(3), warp);
-    EXPECT_EQ(hosted.Settle(), 8);
-    EXPECT_EQ(hosted.stages().Take(), c.runs);
+    EXPECT_EQ(hosted.Runs(), c.runs);
     EXPECT_EQ(hosted.Warp(3) == warp, c.index == kFraming);
   }
 }
@@ -128,17 +100,17 @@ TEST(StoredCompressionTest, OptionsAndTheHostDecideWhetherItIsDeflated) {
 TEST_F(StoredServiceTest, WhatCannotBeReadIsToldAndWaitsForAnalyze) {
   Solve(2);
   const SavedEffect saved = hosted.Save();
-  const std::string good = BytesOf(saved);
-  std::uint64_t words[3];
-  std::memcpy(words, good.data(), sizeof words);
-  EXPECT_EQ(words[0], 16 + (std::uint64_t{1} << 32) + (std::uint64_t{1} << 40));  // flattened, raw
-  EXPECT_EQ(words[1], 0u) << "no address";
-  EXPECT_EQ(words[2], good.size() - 31);
+  std::string good = BytesOf(saved);
+  // Flattened and raw, and no address.
+  const std::uint64_t header[] = {0x10100000010, 0, good.size() - 31};
+  EXPECT_EQ(std::memcmp(good.data(), header, sizeof header), 0);
+  good.replace(8, 8, 8, '\xee');  // that of another process
+  const auto with = [&good](std::size_t offset, int byte) {
+    std::string bytes = good;
+    bytes[offset] = static_cast<char>(byte);
+    return bytes;
+  };
   const std::size_t mesh = good.find("hseM");
-  std::string bad_marker = good, other_grid = good, deflated_12 = good;
-  bad_marker[mesh] = 'H';
-  ++other_grid[mesh + 4];
-  deflated_12[0] = 12;  // whose payloads are deflated whatever the flag says
   const std::string again = "Calmframe requires re-analysis because ";
   const std::string damaged = again + "saved data has been damaged.";
   const struct {
@@ -146,15 +118,15 @@ TEST_F(StoredServiceTest, WhatCannotBeReadIsToldAndWaitsForAnalyze) {
     std::string message;
     int width = 96;
   } cases[] = {
-      {FlatHandle(2, 0, ""), again + "the project data is from an old version."},
-      {FlatHandle(17, 0, ""), again + "the project data is from a newer version."},
-      {FlatHandle(16, 4, "????"), damaged},
-      {FlatHandle(16, std::uint64_t{1} << 40, ""), damaged},
+      {with(0, 2), again + "the project data is from an old version."},
+      {with(0, 17), again + "the project data is from a newer version."},
+      {with(0, 12), damaged},  // whose payloads are deflated whatever the flag says
+      {with(21, 1), damaged},  // 2^40 bytes
       {std::string(10, '\1'), damaged},
-      {bad_marker, damaged},
-      {deflated_12, damaged},
+      {with(mesh, 'H'), damaged},
       {good.substr(0, good.size() - 40), damaged},
-      {other_grid, "Calmframe requires re-analysis because of an old project format."},
+      {with(mesh + 4, good[mesh + 4] + 1),
+       "Calmframe requires re-analysis because of an old project format."},
       {good,
        "Calmframe for layer \u201cClip 1\u201d requires re-analysis because the source dimensions "
        "have changed from 96x64 to 50x64.",
@@ -178,7 +150,7 @@ TEST_F(StoredServiceTest, WhatCannotBeReadIsToldAndWaitsForAnalyze) {
 TEST_F(StoredServiceTest, AnEmptyPayloadLeavesNoState) {
   Solve(3);
   const SavedEffect saved = hosted.Save();
-  hosted.Open(WithBytes(saved, FlatHandle(16, 0, "")));
+  hosted.Open(WithBytes(saved, BytesOf(saved).replace(16, 8, 8, '\0').substr(0, 31)));
   EXPECT_TRUE(hosted.Messages().empty());
   EXPECT_TRUE(hosted.Tick().ok());
   hosted.Inside([](kelp::effect::StabilizerEffect& effect) {

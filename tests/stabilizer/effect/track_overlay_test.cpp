@@ -44,9 +44,7 @@ TEST_F(ExperimentalTrackOverlayTest, BothPathsAndPartsShowTheInputWithItsTracksA
   for (const int depth : {8, 16, 32}) {
     const auto whole = DrawBoth({1, depth});
     EXPECT_NEAR(Changed(*whole), kDot, 8) << "one dot, nothing stabilized";
-    RenderRequest request{1, depth};
-    request.part = HX_Rect{15, 12, 35, 26};
-    const auto part = DrawBoth(request);
+    const auto part = DrawBoth({1, depth, {1, 1}, HX_Rect{15, 12, 35, 26}});
     for (int i = 0; i < 14 * 20 * 4; ++i) {
       const int x = 15 + i / 4 % 20, y = 12 + i / 80;
       ASSERT_EQ(ChannelAt(*part, x, y, i % 4), ChannelAt(*whole, x, y, i % 4)) << x << " " << y;

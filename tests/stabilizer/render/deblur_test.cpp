@@ -1,7 +1,9 @@
 #include "stabilizer/render/deblur.h"
 
 #include <cmath>
+#include <numeric>
 
+#include "synthetic/scene.h"
 #include "tests/stabilizer/render/solved_clip.h"
 
 namespace marrow::render {
@@ -58,35 +60,27 @@ class DeblurChoice : public testing::Test {
   }
 };
 
-TEST_F(DeblurChoice, TheSlowestOfTheParityWithinTheRange) {
-  const struct {
-    std::size_t frame;
-    int range, chosen;
-  } cases[] = {{3, 2, 5}, {3, 3, 5}, {1, 2, 3}, {1, 3, 3}, {1, 4, 5},
-               {2, 2, 0}, {4, 2, 6}, {4, 3, 6}, {4, 4, 0}, {6, 99, 0}};
-  for (const auto& c : cases) {
-    EXPECT_EQ(Chosen(clip, c.frame, Within(c.range)), c.chosen) << c.frame << " in " << c.range;
-    EXPECT_EQ(pictures.asked.size(), 2u);
-  }
-  // Its own speed is the lowest: no debug view shows another, and nothing else is fetched.
-  for (const int slowest : {0, 5}) {
-    DeblurSettings settings = Within(3, -1);
-    settings.show_map = true;
-    EXPECT_EQ(Shown(clip, slowest, settings), slowest);
-    EXPECT_EQ(pictures.asked.size(), 1u);
-    EXPECT_EQ(Chosen(clip, slowest, settings), slowest);
-  }
-}
-
-TEST_F(DeblurChoice, OnlyFramesAboveTheThreshold) {
-  EXPECT_EQ(Chosen(clip, 3, Within(2, 6.99)), 5);
-  EXPECT_EQ(Chosen(clip, 3, Within(2, 7)), 3);
-  EXPECT_EQ(pictures.asked.size(), 1u);
+TEST_F(DeblurChoice, TheSlowestOfTheParityWithinTheRangeForFramesAboveTheThreshold) {
   // The first and the last frame stand in for the ones beyond: speeds 3 0 0 0 3.
   const SolvedClip swing = ClipOf({0, 3, 0, 3, 0});
-  EXPECT_EQ(Chosen(swing, 0, Within(2, 2.99)), 2);
-  EXPECT_EQ(Chosen(swing, 0, Within(2, 3)), 0);
-  EXPECT_EQ(Chosen(swing, 4, Within(2, 2.99)), 2);
+  const struct {
+    const SolvedClip& of;
+    int frame, range, chosen;
+    double threshold = 0;
+  } cases[] = {{clip, 3, 2, 5},       {clip, 3, 3, 5},       {clip, 1, 2, 3},
+               {clip, 1, 3, 3},       {clip, 1, 4, 5},       {clip, 2, 2, 0},
+               {clip, 4, 2, 6},       {clip, 4, 3, 6},       {clip, 4, 4, 0},
+               {clip, 6, 99, 0},      {clip, 0, 3, 0, -1},   {clip, 5, 3, 5, -1},
+               {clip, 3, 2, 5, 6.99}, {clip, 3, 2, 3, 7},    {swing, 0, 2, 2, 2.99},
+               {swing, 0, 2, 0, 3},   {swing, 4, 2, 2, 2.99}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(&c - cases);
+    DeblurSettings settings = Within(c.range, c.threshold);
+    EXPECT_EQ(Chosen(c.of, c.frame, settings), c.chosen);
+    EXPECT_EQ(pictures.asked.size(), c.chosen == c.frame ? 1u : 2u);
+    settings.show_map = true;
+    EXPECT_EQ(Shown(c.of, c.frame, settings) == c.frame, c.chosen == c.frame) << "no map either";
+  }
 }
 
 TEST_F(DeblurChoice, TheAlignedViewShowsAnyFrame) {
@@ -100,11 +94,7 @@ TEST_F(DeblurChoice, TheAlignedViewShowsAnyFrame) {
     settings.aligned_frame = c.offset;
     EXPECT_EQ(Shown(clip, 5, settings), c.shown) << c.offset;
   }
-  EXPECT_EQ(deblurReach(settings), 50);
-  settings.debug = DeblurDebug::off;
-  EXPECT_EQ(deblurReach(settings), 9);
   // Two frames have no third one of a parity.
-  settings.debug = DeblurDebug::aligned_frame;
   settings.aligned_frame = 1;
   EXPECT_EQ(Shown(ClipOf({0, 5}), 0, settings), 0);
 }
@@ -237,6 +227,36 @@ TYPED_TEST(Deblur, PixelsAreComparedBlurredAndTakenSharp) {
   EXPECT_TRUE(Same(view(DeblurDebug::blurred_sharper_frame), blurred));
   this->settings.show_map = true;
   EXPECT_TRUE(Same(view(DeblurDebug::this_frame), own)) << "a view comes before the map";
+}
+
+// Between frames 2 and 4 the camera is knocked aside by 14 pixels, and rests before and after.
+TEST(DeblurredScene, AKnockedFrameComesCloserToTheSharpTruth) {
+  const auto knocked = [](double t) { return 0.8 * std::clamp((t - 2) / 2, 0.0, 1.0); };
+  const auto pose = [&](double t) { return synthetic::camera_pose{{}, {knocked(t), 0, 0}}; };
+  const synthetic::camera_path path{pose, pose};
+  synthetic::scene_options options{.width = 160, .height = 90};
+  const synthetic::scene sharp(synthetic::wall(8), path, options);
+  options.exposure = [](int frame) { return frame == 3 ? 0.8 : 0.0; };
+  const synthetic::scene shot(synthetic::wall(8), path, options);
+  SolvedClip clip(160, 90, 3, 3);
+  Pictures<HX_Pixel8> pictures;
+  for (int f = 0; f < 7; ++f) {
+    clip.Add(Moved(sharp.camera().focal * knocked(f) / 8, 0));
+    pictures.Add(160, 90, {});
+    sharp.render(f, pictures.worlds[f]->data(), 160);
+  }
+  const auto truth = Deblurred(clip, pictures, 3, {});
+  shot.render(3, pictures.worlds[3]->data(), 160);
+  const auto error = [&](int range) {
+    const auto found = Deblurred(clip, pictures, 3, {.range = range});
+    const auto of = [](const auto& world) {
+      return reinterpret_cast<const std::uint8_t*>(world.data());
+    };
+    const auto end = of(found) + 4 * found.width() * found.height();
+    return std::inner_product(of(found), end, of(truth), 0.0, std::plus(),
+                              [](double a, double b) { return (a - b) * (a - b); });
+  };
+  EXPECT_GT(10 * std::log10(error(0) / error(3)), 6) << "dB";
 }
 
 }  // namespace

@@ -27,22 +27,16 @@ TYPED_TEST(EdgePreparationTest, AlphaRisesFromTheCutsAndColoursStay) {
   for (const auto& [width, height] : {std::pair{61, 43}, {7, 50}, {1, 1}}) {
     const auto from = Textured<TypeParam>(width, height, 3, alphas::patches);
     for (const EdgePreparation& e : edges) {
-      // Odd rows, with padding that must stay.
-      const std::ptrdiff_t row_bytes = sizeof(TypeParam) * width + 3 * alignof(TypeParam);
-      std::vector<unsigned char> buffer(row_bytes * height, 0xAB);
-      WorldX<TypeParam> to(width, height, row_bytes, reinterpret_cast<TypeParam*>(buffer.data()));
-      prepareEdges(*from, e, to);
+      PaddedWorld<TypeParam> to(width, height);
+      prepareEdges(*from, e, to.pixels);
       for (int y = 0; y < height; ++y) {
         for (int x = 0; x < width; ++x) {
-          const TypeParam &p = to.row(y)[x], &s = from->row(y)[x];
+          const TypeParam &p = to.pixels.row(y)[x], &s = from->row(y)[x];
           const double alpha = s.alpha * Factor(x, y, width, height, e);
           ASSERT_NEAR(p.alpha, rounds<TypeParam> ? std::floor(alpha + 0.5) : alpha,
                       rounds<TypeParam> ? 0 : 1e-6)
               << x << ", " << y << " of " << width << " by " << height;
           ASSERT_TRUE(p.red == s.red && p.green == s.green && p.blue == s.blue);
-        }
-        for (std::ptrdiff_t i = sizeof(TypeParam) * width; i < row_bytes; ++i) {
-          ASSERT_EQ(buffer[row_bytes * y + i], 0xAB);
         }
       }
     }
@@ -73,7 +67,7 @@ TEST(PreparedSources, EachFrameIsPreparedOnceThoughTwoAreHeld) {
     EXPECT_EQ(world->row(1)[0].alpha, 0);
     EXPECT_EQ(world->row(1)[1].alpha, 255);
   }
-  EXPECT_EQ(frames.TakeAsked(), (std::vector<std::size_t>{9, 5, 6, 4, 7, 3, 8, 2}));
+  EXPECT_EQ(frames.asked, (std::vector<std::size_t>{9, 5, 6, 4, 7, 3, 8, 2}));
   EXPECT_EQ(kept->row(0)[1].red, 9);
   // What somebody still holds is not written over.
   const auto two = prepared.fetch(2);

@@ -7,13 +7,6 @@
 namespace marrow::render {
 namespace {
 
-Motion Bent(point2 shift, double turn, double bend) {
-  return [=](double x, double y) {
-    return point2{x - turn * y + bend * std::sin(y / 9) + shift.x,
-                  y + turn * x + bend * std::sin(x / 7) + shift.y};
-  };
-}
-
 // Every pass in full.
 template <class Pixel>
 void PlainSynthesis(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
@@ -28,14 +21,10 @@ void PlainSynthesis(const FramePass<Pixel>& pass, WorldX<Pixel>& output) {
       }
     }
   }
-  const double n = std::floor(pass.settings.alpha_boost + 0.5);
-  if (n < 2) return;
-  const auto most = world_view<Pixel>::full;
-  for (int y = 0; y < output.height(); ++y) {
-    for (int x = 0; x < output.width(); ++x) {
-      auto& alpha = output.row(y)[x].alpha;
-      if (alpha < most) alpha = std::min<double>(n * alpha, most);
-    }
+  const double n = std::max(std::floor(pass.settings.alpha_boost + 0.5), 1.0);
+  for (int i = 0; i < output.width() * output.height(); ++i) {
+    auto& alpha = output.row(i / output.width())[i % output.width()].alpha;
+    if (alpha < full<Pixel>) alpha = std::min<double>(n * alpha, full<Pixel>);
   }
 }
 
@@ -52,14 +41,19 @@ TYPED_TEST(EdgeSynthesis, WhatIsNotDrawnWouldNotHaveShown) {
     SolvedClip clip(190, 140, 9, 7);
     Pictures<TypeParam> bare, prepared;
     const double shake = run % 2 ? 40 : 6;
-    RenderSettings settings;
-    settings.framing = Framing::synthesize_edges;
-    settings.synthesis_range = run % 5 == 0 ? 3 : 20;
-    settings.additional_scale = run % 7 == 3 ? 0.7f : 1.0f;
-    settings.alpha_boost = run % 4;
+    RenderSettings settings{.framing = Framing::synthesize_edges,
+                            .additional_scale = run % 7 == 3 ? 0.7f : 1.0f,
+                            .shift_x = 15,
+                            .shift_y = 4,
+                            .synthesis_range = run % 5 == 0 ? 3 : 20,
+                            .alpha_boost = 1.0 * (run % 4)};
     if (run % 3 != 1) settings.edges = {2.0 * (run % 2), 0, 3, 1, 4};
     for (int f = 0; f < 9; ++f) {
-      clip.Add(Bent({within(shake), within(shake)}, within(0.05), within(3)));
+      const double dx = within(shake), dy = within(shake), turn = within(0.05), bend = within(3);
+      clip.Add([=](double x, double y) {
+        return point2{x - turn * y + bend * std::sin(y / 9) + dx,
+                      y + turn * x + bend * std::sin(x / 7) + dy};
+      });
       bare.Add(Textured<TypeParam>(190, 140, 100 * run + f, run % 3 ? alphas::full : alphas::odd));
       prepared.Add(190, 140, {});
       prepareEdges(*bare.worlds[f], scaledEdges(settings.edges, 1), *prepared.worlds[f]);
@@ -68,24 +62,18 @@ TYPED_TEST(EdgeSynthesis, WhatIsNotDrawnWouldNotHaveShown) {
     Renderer renderer = makeRenderer(clip, 1, 1);
     // A part of the plane, in rows with padding.
     const int width = renderer.planeWidth - 20, height = renderer.planeHeight - 9;
-    settings.shift_x = 15;
-    settings.shift_y = 4;
-    const std::ptrdiff_t row_bytes = sizeof(TypeParam) * (width + 3);
-    std::vector<TypeParam> found_pixels((width + 3) * height, TypeParam{7, 7, 7, 7});
-    std::vector<TypeParam> plain_pixels = found_pixels;
-    WorldX<TypeParam> found(width, height, row_bytes, found_pixels.data());
-    WorldX<TypeParam> expected(width, height, row_bytes, plain_pixels.data());
+    PaddedWorld<TypeParam> found(width, height), expected(width, height);
     const std::size_t frame = run < 2 ? 8 * run : random() % 9;
 
-    ASSERT_TRUE(
-        renderFrame<TypeParam>(clip, nullptr, settings, renderer, frame, bare, operations, found));
+    ASSERT_TRUE(renderFrame<TypeParam>(clip, nullptr, settings, renderer, frame, bare, operations,
+                                       found.pixels));
     EXPECT_EQ(std::set<std::size_t>(bare.asked.begin(), bare.asked.end()).size(),
               bare.asked.size());
-    expected.clear();
+    expected.pixels.clear();
     PlainSynthesis<TypeParam>({clip, settings, renderer, prepared, operations, frame,
                                wholePlane(renderer), settings.additional_scale},
-                              expected);
-    ASSERT_EQ(std::memcmp(found_pixels.data(), plain_pixels.data(), row_bytes * height), 0);
+                              expected.pixels);
+    ASSERT_TRUE(found.buffer == expected.buffer);
   }
 }
 
@@ -98,10 +86,6 @@ class Stripes : public testing::Test {
  protected:
   static constexpr int kSide = 24;
 
-  Stripes() : clip(kSide, kSide, 4, 4) {
-    settings.framing = Framing::synthesize_edges;
-    settings.synthesis_range = 10;
-  }
   void Shoot(const std::vector<double>& shifts) {
     for (const double shift : shifts) {
       clip.Add(Moved(shift, 0));
@@ -119,11 +103,10 @@ class Stripes : public testing::Test {
     const Pixel p = Row(frame).at(x);
     return p.alpha == 0 ? -1 : static_cast<int>(std::lround(p.red / full<Pixel> * 10)) - 1;
   }
-  double Alpha(std::size_t x) { return Row(0).at(x).alpha / full<Pixel>; }
 
-  SolvedClip clip;
+  SolvedClip clip{kSide, kSide, 4, 4};
   Pictures<Pixel> pictures;
-  RenderSettings settings;
+  RenderSettings settings{.framing = Framing::synthesize_edges, .synthesis_range = 10};
 };
 TYPED_TEST_SUITE(Stripes, Depths);
 
@@ -161,25 +144,24 @@ TYPED_TEST(Stripes, FeatherAndBoostAreInTheAlphas) {
   const double near = rounds<TypeParam> ? 1.5 / 255 : 1e-6;
   this->Shoot({0, 0});
   this->settings.edges.feather = 3;
-  this->settings.synthesis_range = 0;
-  // Columns have 1/8, 1/2, 7/8, 1; a pixel shows the middle between its column and the one before.
-  EXPECT_NEAR(this->Alpha(1), 5.0 / 16, near);
-  EXPECT_NEAR(this->Alpha(2), 11.0 / 16, near);
-  EXPECT_NEAR(this->Alpha(3), 15.0 / 16, near);
-  EXPECT_EQ(this->Alpha(4), 1);
-
-  // Another frame behind: a + b - a b.
-  this->settings.synthesis_range = 1;
-  EXPECT_NEAR(this->Alpha(1), 2 * 5.0 / 16 - 25.0 / 256, near);
-  this->settings.synthesis_range = 0;
+  // Columns have 1/8, 1/2, 7/8, 1; a pixel shows the middle between its column and the one before,
+  // and with another frame behind a + b - a b.
   const struct {
-    double boost, first, second;
-  } cases[] = {
-      {0, 5.0 / 16, 11.0 / 16}, {1.4, 5.0 / 16, 11.0 / 16}, {1.5, 10.0 / 16, 1}, {3, 15.0 / 16, 1}};
+    int range;
+    double boost, first, second, third;
+  } cases[] = {{1, 1, 10 - 25. / 16, 22 - 121. / 16, 30 - 225. / 16},
+               {0, 0, 5, 11, 15},
+               {0, 1.4, 5, 11, 15},
+               {0, 1.5, 10, 16, 16},
+               {0, 3, 15, 16, 16}};
   for (const auto& c : cases) {
+    this->settings.synthesis_range = c.range;
     this->settings.alpha_boost = c.boost;
-    EXPECT_NEAR(this->Alpha(1), c.first, 3 * near) << c.boost;
-    EXPECT_NEAR(this->Alpha(2), c.second, near) << c.boost;
+    const auto row = this->Row(0);
+    EXPECT_NEAR(row[1].alpha / full<TypeParam>, c.first / 16, near * std::max(c.boost, 1.0));
+    EXPECT_NEAR(row[2].alpha / full<TypeParam>, c.second / 16, near);
+    EXPECT_NEAR(row[3].alpha / full<TypeParam>, c.third / 16, near);
+    EXPECT_EQ(row[4].alpha, full<TypeParam>);
   }
   EXPECT_NEAR(this->Row(0)[1].red / full<TypeParam>, 0.1, near);
 }
@@ -215,32 +197,6 @@ TEST(EdgeSynthesisTiles, ANeighbourThatReachesNothingOpenIsNotFetched) {
   for (int f = 0; f < 4; ++f) pictures.Add(200, 200, {255, 0, 0, 0});
   Rendered(clip, pictures, {.framing = Framing::synthesize_edges, .synthesis_range = 3});
   EXPECT_EQ(pictures.asked, (Asked{0, 2, 3}));
-}
-
-TEST(TileMaps, RectanglesCoverTheSetOnce) {
-  std::mt19937 random(2);
-  for (int run = 0; run < 50; ++run) {
-    TileMap map(5 * TileMap::side + run % 30, 4 * TileMap::side - run % 7);
-    std::vector<int> covered(map.width() * map.height()), touched(covered);
-    for (int i = 0; i < run % 9; ++i) {
-      const int x = random() % map.width(), y = random() % map.height();
-      map.add(x - 1, y, x + random() % 60, y + 1 + random() % 40);
-    }
-    map.add(-50, -50, 0, 0);
-    map.add(10, 10, 10, 400);
-    for (const pixel_rect& r : map.rects()) {
-      for (int i = 0; i < (r.right - r.left) * (r.bottom - r.top); ++i) {
-        const int width = r.right - r.left;
-        ++covered[(r.top + i / width) * map.width() + r.left + i % width];
-      }
-    }
-    for (int i = 0; i < static_cast<int>(touched.size()); ++i) {
-      const int x = i % map.width(), y = i / map.width();
-      touched[i] = map.touches(x, y, x + 1, y + 1);
-    }
-    EXPECT_EQ(covered, touched);
-    EXPECT_EQ(map.empty(), map.rects().empty());
-  }
 }
 
 }  // namespace

@@ -5,8 +5,6 @@
 namespace marrow::render {
 namespace {
 
-using ::testing::ElementsAre;
-
 TEST(IsOvercropped, UnderTwoFifthsAsShown) {
   const SolvedClip clip(1920, 1080, 3, 3, Moved(0, 0));
   Renderer renderer = makeRenderer(clip, 1, 1);
@@ -27,21 +25,6 @@ TEST(IsOvercropped, UnderTwoFifthsAsShown) {
     EXPECT_EQ(isOvercropped(clip, crop, {.framing = c.framing}, renderer), c.overcropped)
         << c.width << " by " << c.height;
   }
-}
-
-TEST(SetupOutputRect, TheWholePlaneWithoutACrop) {
-  const SolvedClip clip(100, 80, 3, 3, [](double x, double y) {
-    return point2{x * 1.1 - 8, y * 1.1 - 3.5};
-  });
-  const Renderer renderer = makeRenderer(clip, 1, 1);
-  const auto numbers = [&](Framing framing) {
-    const auto [width, height, x, y] = setupOutputRect(framing, renderer, 100, 80);
-    return std::vector<int>{width, height, x, y};
-  };
-  // 99 * 1.1 = 108.9 and 79 * 1.1 = 86.9; half of the difference, truncated.
-  EXPECT_THAT(numbers(Framing::stabilize_only), ElementsAre(109, 87, 4, 3));
-  EXPECT_THAT(numbers(Framing::synthesize_edges), ElementsAre(109, 87, 4, 3));
-  EXPECT_THAT(numbers(Framing::crop), ElementsAre(100, 80, 0, 0));
 }
 
 // A plane of 132 x 82 about a frame of 100 x 80. Pixels' centres are whole in the plane, and its

@@ -4,21 +4,6 @@
 
 namespace {
 
-Renderer FullHd(float scale = 1) {
-  return Renderer({-4.5, 0, 1925.25, 1083}, 1920, 1080, 64, 36, scale, scale);
-}
-
-TEST(RendererGeometry, PlaneAndCells) {
-  const Renderer r = FullHd();
-  EXPECT_EQ(r.planeWidth, 1930);
-  EXPECT_EQ(r.planeHeight, 1083);
-  EXPECT_NEAR(r.cellWidth, 30.46031746, 1e-8);
-  EXPECT_NEAR(r.cellHeight, 30.82857143, 1e-8);
-  const Renderer half = FullHd(.5f);
-  EXPECT_EQ(half.sourceWidth, 960);
-  EXPECT_EQ(half.planeWidth, 965);
-}
-
 TEST(FitZoom, CoversTheFrameWithinItsLimitsElseCentresTheWindow) {
   const struct {
     float scale;
@@ -35,7 +20,7 @@ TEST(FitZoom, CoversTheFrameWithinItsLimitsElseCentresTheWindow) {
                {.5f, 1800, 1000, 0, 1.5f, 1, 1.081f, 0, 0, 960, 540}};
   for (const auto& c : cases) {
     SCOPED_TRACE(testing::Message() << c.width << " by " << c.height << ", " << c.maximum);
-    Renderer r = FullHd(c.scale);
+    Renderer r({-4.5, 0, 1925.25, 1083}, 1920, 1080, 64, 36, c.scale, c.scale);
     EXPECT_NEAR(r.fitZoom(1920, 1080, c.width, c.height, c.action_safe, c.maximum, c.additional),
                 c.zoom, 1e-6);
     EXPECT_EQ(r.outLeft, c.left);

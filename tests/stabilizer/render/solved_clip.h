@@ -57,11 +57,9 @@ inline Motion Moved(double dx, double dy) {
 
 class SolvedClip final : public ClipWarps {
  public:
-  SolvedClip(int width, int height, int cols, int rows)
-      : width_(width), height_(height), cols_(cols), rows_(rows) {}
-  SolvedClip(int width, int height, int cols, int rows, const Motion& to)
-      : SolvedClip(width, height, cols, rows) {
-    Add(to);
+  SolvedClip(int width, int height, int cols, int rows, const Motion& to = {})
+      : width_(width), height_(height), cols_(cols), rows_(rows) {
+    if (to) Add(to);
   }
   void Add(const Motion& to) {
     warps_.emplace_back(cols_, rows_);
@@ -117,7 +115,6 @@ class Pictures final : public SourceFrames<Pixel> {
     if (frame == refused) throw std::int32_t{42};
     return worlds.at(frame);
   }
-  std::vector<std::size_t> TakeAsked() { return std::exchange(asked, {}); }
 
   std::vector<world> worlds;
   std::vector<std::size_t> asked;
@@ -151,6 +148,26 @@ WorldX<Pixel> Rendered(const SolvedClip& clip, Pictures<Pixel>& pictures,
       renderFrame<Pixel>(clip, crop, settings, renderer, frame, pictures, operations, output));
   return output;
 }
+
+// Rows that are padded, and for bytes begin anywhere; what lies between them must stay as it is.
+template <class Pixel>
+struct PaddedWorld {
+  PaddedWorld(int width, int height)
+      : row_bytes(sizeof(Pixel) * width + 3 * alignof(Pixel)),
+        buffer(static_cast<std::size_t>(row_bytes * height), 0xAB),
+        pixels(width, height, row_bytes, reinterpret_cast<Pixel*>(buffer.data())) {}
+  ~PaddedWorld() {
+    int changed = 0;
+    for (std::size_t i = 0; i < buffer.size(); ++i) {
+      changed += i % row_bytes >= sizeof(Pixel) * pixels.width() && buffer[i] != 0xAB;
+    }
+    EXPECT_EQ(changed, 0) << "bytes between the rows";
+  }
+
+  const std::ptrdiff_t row_bytes;
+  std::vector<unsigned char> buffer;
+  WorldX<Pixel> pixels;
+};
 
 template <class Pixel>
 bool Same(const WorldX<Pixel>& a, const WorldX<Pixel>& b) {

@@ -22,25 +22,20 @@ struct Sample {
   std::string plain;
 };
 
-inline std::string Inflated(const std::string& bytes) {
+// By uncompress() or compress().
+template <class Transform>
+std::string Zlib(const Transform& transform, const std::string& bytes) {
   std::string out(1 << 20, '\0');  // more than any of them needs
-  uLongf size = static_cast<uLongf>(out.size());
-  if (uncompress(reinterpret_cast<Bytef*>(out.data()), &size,
-                 reinterpret_cast<const Bytef*>(bytes.data()),
-                 static_cast<uLong>(bytes.size())) != Z_OK) {
+  uLongf size = out.size();
+  if (transform(reinterpret_cast<Bytef*>(out.data()), &size,
+                reinterpret_cast<const Bytef*>(bytes.data()), bytes.size()) != Z_OK) {
     throw std::runtime_error("sample is not whole");
   }
   out.resize(size);
   return out;
 }
-
 inline std::string Deflated(const std::string& bytes) {
-  uLongf size = compressBound(static_cast<uLong>(bytes.size()));
-  std::string out(size, '\0');
-  compress(reinterpret_cast<Bytef*>(out.data()), &size,
-           reinterpret_cast<const Bytef*>(bytes.data()), static_cast<uLong>(bytes.size()));
-  out.resize(size);
-  return out;
+  return Zlib(compress, bytes);
 }
 
 // "v16_solved".
@@ -49,7 +44,7 @@ inline Sample ReadSample(const std::string& name) {
   Sample sample{static_cast<std::uint32_t>(std::stoul(name.substr(1, 2))),
                 {std::istreambuf_iterator<char>(file), {}},
                 {}};
-  sample.plain = Inflated(sample.deflated);
+  sample.plain = Zlib(uncompress, sample.deflated);
   return sample;
 }
 
