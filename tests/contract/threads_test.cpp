@@ -19,9 +19,9 @@
 namespace calmframe::host {
 namespace {
 
-constexpr std::int64_t kFrames = 30, kMostStart = 4;
+constexpr std::int64_t kPlayed = 30, kMostStart = 4;
 constexpr std::size_t kMostEffects = 4;
-const ShakyClip kClips[] = {{160, 120, kFrames, "played with"}, {128, 96, kFrames, "and another"}};
+const ShakyClip kClips[] = {{160, 120, kPlayed, "played with"}, {128, 96, kPlayed, "and another"}};
 
 class TourThreads : public PlayedPlugin {
  protected:
@@ -64,7 +64,7 @@ class TourThreads : public PlayedPlugin {
       }
       for (unsigned i = 0; renderer && i < random() % 8; ++i) {
         const bool direct = random() % 3 == 0;
-        RenderRequest request{static_cast<std::int64_t>(random() % (kFrames - kMostStart))};
+        RenderRequest request{static_cast<std::int64_t>(random() % (kPlayed - kMostStart))};
         request.bit_depth = 8 << random() % (direct ? 2 : 3);
         request.downsample.den = 1 + random() % 2;
         if (random() % 4 == 0) request.part = HX_Rect{10, 10, 50, 40};
@@ -140,7 +140,7 @@ class TourThreads : public PlayedPlugin {
         [&] {
           layer->Change([start = random() % (kMostStart + 1)](LayerState& state) {
             state.start_frame = static_cast<std::int32_t>(start);
-            state.length = static_cast<std::int32_t>(kFrames - kMostStart);
+            state.length = static_cast<std::int32_t>(kPlayed - kMostStart);
           });
         },
         [&] { Refuse(*layer, random() % 2 ? "" : "Not now."); },
@@ -188,7 +188,7 @@ TEST_F(TourThreads, ASoakLosesNothingAndLeavesNothing) {
   std::size_t held_early = 0;
   for (int quarter = 1; quarter <= 4; ++quarter) {
     Storm(random, [&] { return 4 * instances_ >= quarter * wanted; });
-    for (const auto& layer : layers_) Trim(*layer, 0, kFrames);
+    for (const auto& layer : layers_) Trim(*layer, 0, kPlayed);
     const std::size_t survivors = session().effects().size();
     for (std::size_t i = 0; i < survivors; ++i) {
       SCOPED_TRACE("instance " + std::to_string(instances_));

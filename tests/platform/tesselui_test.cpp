@@ -12,7 +12,6 @@
 namespace tesselui {
 namespace {
 
-using drawbot::Color;
 using drawbot::Path;
 using drawbot::Surface;
 

@@ -41,13 +41,6 @@ TEST(GuidTest, OtherTextsAreHashed) {
   EXPECT_EQ(guid, StateOfSeed(3));
 }
 
-TEST(GuidTest, UniqueOnesAreUnique) {
-  std::set<Guid> made;
-  for (int i = 0; i < 1000; ++i) made.insert(Guid::MakeUnique());
-  EXPECT_EQ(made.size(), 1000u);
-  EXPECT_EQ(made.count(Guid()), 0u);
-}
-
 TEST(MixHashTest, PublishedValuesStandForEver) {
   const std::string fox = "The quick brown fox jumps over the lazy dog";
   EXPECT_EQ(MixHash(Guid(), fox.data(), fox.size()).ToText(),

@@ -40,24 +40,6 @@ void ExpectWellFormed(const track_world& world) {
   }
 }
 
-TEST(TrackWorldTest, LivesAreGeometricAndSlotsAreRefilled) {
-  const track_world world = make_track_world(
-      {.frame_count = 1200, .slots = 100, .scene = track_scene::still, .mean_life = 60});
-  ExpectWellFormed(world);
-  double length = 0, longer = 0;
-  int count = 0;
-  for (const Trajectory& t : trajectories_of(world)) {
-    if (t.first >= 600) continue;  // late ones are cut by the clip's end
-    length += t.last - t.first;
-    longer += t.last - t.first > 60;
-    ++count;
-  }
-  ASSERT_GT(count, 800);
-  EXPECT_NEAR(length / count, 60, 6);
-  EXPECT_NEAR(longer / count, std::pow(1 - 1.0 / 60, 60), 0.06);
-  for (const auto& cell : *world.features.features) ASSERT_GE(cell.status, 0);
-}
-
 TEST(TrackWorldTest, EveryKindOfSceneIsWellFormedAndRepeatable) {
   for (const track_scene scene : {track_scene::depth, track_scene::planar, track_scene::translation,
                                   track_scene::similarity, track_scene::still}) {

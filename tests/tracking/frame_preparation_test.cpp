@@ -14,14 +14,14 @@ namespace {
 // must stay.
 void ExpectPlainLoops(std::size_t width, std::ptrdiff_t padding, bool bottom_up,
                       std::mt19937& random) {
-  constexpr std::size_t kHeight = 3;
+  constexpr std::size_t kRows = 3;
   const std::ptrdiff_t pitch = 4 * width + padding;
-  std::vector<std::uint8_t> bytes(pitch * (kHeight - 1) + 4 * width);
+  std::vector<std::uint8_t> bytes(pitch * (kRows - 1) + 4 * width);
   for (auto& b : bytes) b = random() & 255;
-  const ArgbFrame frame{bytes.data() + (bottom_up ? pitch * (kHeight - 1) : 0),
-                        bottom_up ? -pitch : pitch, width, kHeight};
+  const ArgbFrame frame{bytes.data() + (bottom_up ? pitch * (kRows - 1) : 0),
+                        bottom_up ? -pitch : pitch, width, kRows};
   std::vector<std::uint8_t> luma, mask, color;
-  for (std::size_t i = 0; i < width * kHeight; ++i) {
+  for (std::size_t i = 0; i < width * kRows; ++i) {
     const auto* p =
         frame.top_row + static_cast<std::ptrdiff_t>(i / width) * frame.row_bytes + 4 * (i % width);
     luma.push_back((9798 * p[1] + 19235 * p[2] + 3735 * p[3] + 16384) / 32768);

@@ -35,7 +35,7 @@ void operator delete(void* block, std::size_t) noexcept {
 namespace kelp::effect {
 namespace {
 
-constexpr SourceShape kPresent{64, 36, 1, 1};
+constexpr SourceShape kDamagedShape{64, 36, 1, 1};
 // A record's buffer, a piece of the table, a stream's buffers.
 constexpr std::int64_t kScratch = 1 << 20;
 
@@ -47,7 +47,7 @@ bool Loads(const std::string& payload, std::uint32_t version, bool raw, std::siz
   const std::int64_t limit = live + kScratch + 6 * static_cast<std::int64_t>(expanded);
   most = live;
   try {
-    const SavedState state = ReadState(payload.data(), payload.size(), version, raw, kPresent);
+    const SavedState state = ReadState(payload.data(), payload.size(), version, raw, kDamagedShape);
     EXPECT_LE(most, limit);
     const auto& table = state.result->all_features;
     EXPECT_EQ(table.features->size(), static_cast<std::size_t>(table.frame_count) *

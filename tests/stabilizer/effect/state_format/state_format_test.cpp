@@ -14,8 +14,6 @@
 namespace kelp::effect {
 namespace {
 
-using tessel::utility::Guid;
-
 constexpr SourceShape kPresent{64, 36, 1, 1};
 
 SavedState Read(const std::string& payload, std::uint32_t version, bool raw,
