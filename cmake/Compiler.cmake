@@ -32,7 +32,7 @@ endif()
 # Several sources as one, the checks' way to read every header fewer times: none of them is the main file any more, which
 # is where GCC lets a type have members of an unnamed namespace.
 if(CMAKE_UNITY_BUILD AND CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
-  add_compile_options(-Wno-subobject-linkage)
+  add_compile_options($<$<COMPILE_LANGUAGE:CXX>:-Wno-subobject-linkage>)
 endif()
 if(CALMFRAME_SANITIZE)
   # -g1: a report needs lines, not variables, which cost a fifth of the build.
