@@ -201,7 +201,7 @@ TEST(LmSolver, LimitsGoByTheirComparison) {
 
   // The first step is bound to 100 |diag x|, |diag p| within a tenth of it.
   dense_problem bound = {straight};
-  const vector x = run({1e-4, 1e-4}).of(bound, 1).x;
+  const vector x = run({1e-4, 1e-4}, 3).of(bound, 1).x;
   const double delta = 100 * std::hypot(5e-4, 13e-4);
   EXPECT_NEAR(std::hypot(5 * (x[0] - 1e-4), 13 * (x[1] - 1e-4)), delta, 0.1 * delta);
 }
