@@ -1,6 +1,5 @@
 #include <nlohmann/json.hpp>
 #include <numbers>
-#include <regex>
 
 #include "tests/apps/calmframe/program_fixture.h"
 
@@ -170,8 +169,12 @@ TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
     EXPECT_GE(std::count(path.begin(), path.end(), 'L'), 19) << plot;
     EXPECT_EQ(path.find("nan"), std::string::npos) << plot;
   }
-  const std::regex picture("src=\"data:image/jpeg;base64,");
-  EXPECT_EQ(std::distance(std::sregex_iterator(dom.begin(), dom.end(), picture), {}), 12);
+  int pictures = 0;
+  for (std::size_t at = 0;
+       (at = dom.find("src=\"data:image/jpeg;base64,", at)) != std::string::npos; ++at) {
+    ++pictures;
+  }
+  EXPECT_EQ(pictures, 12);
 }
 
 }  // namespace
