@@ -42,7 +42,9 @@ RenderCommand::RenderCommand(CLI::App& program)
           "Examples:\n"
           "  calmframe render --project shaky.calm steady.mp4\n"
           "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20")) {
-  AddFile(parser_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe");
+  AddFile(parser_, "OUT", output_,
+          "The steady clip to write; - for a pipe: raw frames, or Matroska with --codec; "
+          "f%04d.png or a folder with / for pictures");
   AddFile(parser_, "--project", project_, "The saved work");
   constexpr int kMost = std::numeric_limits<int>::max();
   AddNumber<int>(

@@ -86,9 +86,10 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
       AddName(command, "--codec", flags.encode.codec,
               "Encoder, such as libx265, or the name of what it encodes; at first H.264, or what "
               "the kind of file takes");
-  CLI::Option* const pixel_format =
-      AddName(command, "--pixel-format", flags.encode.pixel_format,
-              "Pixel format of the encoder; at first 4:2:0 of the clip's depth");
+  CLI::Option* const pixel_format = AddName(
+      command, "--pixel-format", flags.encode.pixel_format,
+      "Pixel format of the encoder; at first the clip's own alpha, chroma and depth, as far as "
+      "the codec has them");
   CLI::Option* const depth = AddChoice(
       command, "--depth", [&flags](const std::string& bits) { flags.depth = std::stoi(bits); },
       {"8", "16", "32"},
@@ -134,8 +135,11 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
           "  calmframe stabilize shaky.mp4 steady.mp4\n"
           "  calmframe stabilize walk.mp4 calm.mp4 --smoothness 100\n"
           "  calmframe stabilize talk.mp4 still.mp4 --result no-motion")) {
-  AddFile(parser_, "IN", input_, "The shaky clip");
-  AddFile(parser_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe");
+  AddFile(parser_, "IN", input_,
+          "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
+  AddFile(parser_, "OUT", output_,
+          "The steady clip to write; - for a pipe: raw frames, or Matroska with --codec; "
+          "f%04d.png or a folder with / for pictures");
   AddControlFlags(parser_, controls_);
   AddOutputFlags(parser_, flags_);
   AddProjectFlag(parser_, project_);

@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <optional>
+#include <string_view>
 
 namespace calmframe::media {
 namespace {
@@ -197,6 +198,7 @@ ClipInfo InfoOf(const std::string& path, const Decoder& decoder, std::vector<Fra
   info.pixel_aspect = ToRatio(aspect);
   const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(static_cast<AVPixelFormat>(first.format));
   if (layout) {
+    info.pixel_format = layout->name;
     info.bit_depth =
         layout->flags & AV_PIX_FMT_FLAG_PAL ? 8 : std::clamp(layout->comp[0].depth, 8, 16);
     info.has_alpha = (layout->flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
@@ -224,6 +226,14 @@ void FrameScan::Add(const AVFrame& frame) {
 ClipInfo FrameScan::Finish() {
   if (!first_) {
     throw Failure(Failure::Side::input, path_ + ": no frame of its video stream decodes");
+  }
+  const std::string_view kind = decoder_.container().iformat->name;
+  if (index_.size() == 1 && (kind == "image2" || kind.ends_with("_pipe"))) {
+    throw Failure(
+        Failure::Side::input,
+        path_ +
+            ": is one picture alone; name more of them as f%04d.png, by a quoted glob, or "
+            "by their folder");
   }
   ClipInfo info = InfoOf(path_, decoder_, std::move(times_), *first_, aspect_, fields_);
   const std::string damage = DamageLine(decoder_, index_.size());
