@@ -94,6 +94,7 @@ TEST_F(ExecutorTest, APausedExecutorBeginsNoTaskAndHoldsTheOneInFlightAtItsWaitP
 
 TEST_F(ExecutorTest, EndQueueFreesAWaitingTaskForGoodAndRunsWhatWasPosted) {
   CompletionEvent begun, done;
+  PostAfter(kLongAfter, [&] { done.Signal(); });  // first, as the other may end the queue at once
   Post([&] {
     begun.Signal();
     executor_->WaitPoint();
@@ -102,7 +103,6 @@ TEST_F(ExecutorTest, EndQueueFreesAWaitingTaskForGoodAndRunsWhatWasPosted) {
     executor_->WaitPoint();
     EXPECT_FALSE(executor_->Post([] { ADD_FAILURE(); }, 0));
   });
-  PostAfter(kLongAfter, [&] { done.Signal(); });
   begun.Wait();
   executor_->Pause();
   executor_->EndQueue();
