@@ -85,6 +85,15 @@ class LiveThreads {
     JoinEnded();
   }
 
+  void JoinEnded() {
+    std::list<std::thread> ended;
+    {
+      std::lock_guard<std::mutex> lock(mutex_);
+      ended.swap(ended_);
+    }
+    for (std::thread& thread : ended) thread.join();
+  }
+
  private:
   using Threads = std::list<std::thread>;
 
@@ -92,15 +101,6 @@ class LiveThreads {
     std::lock_guard<std::mutex> lock(mutex_);
     ended_.splice(ended_.end(), live_, at);
     if (live_.empty()) none_left_.notify_all();
-  }
-
-  void JoinEnded() {
-    Threads ended;
-    {
-      std::lock_guard<std::mutex> lock(mutex_);
-      ended.swap(ended_);
-    }
-    for (std::thread& thread : ended) thread.join();
   }
 
   std::mutex mutex_;
@@ -112,6 +112,12 @@ LiveThreads& live_threads() {
   static LiveThreads& threads = *new LiveThreads;  // outlives its threads
   return threads;
 }
+
+// What has ended is joined at the process's end, too, where nobody shut down.
+struct JoinAtExit {
+  ~JoinAtExit() { live_threads().JoinEnded(); }
+};
+const JoinAtExit join_at_exit;
 
 // A thread a task. A solve runs for minutes and may wait for a frame or a lock of its host: on the
 // pool of the parallel loops it would hold a worker that renders need, and two solves on a
