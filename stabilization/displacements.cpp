@@ -138,17 +138,17 @@ displacement_lists member_displacements(const stabilizer_global& global,
     const auto member = [&](std::int32_t f) {
       return owner[f] != kNoWindow && windows[owner[f]].takes_part(i);
     };
-    std::int32_t first = track.first;
-    while (first < track.last && !member(first)) ++first;
-    std::int32_t end = first;
-    while (end < track.last && member(end)) ++end;
-    append_track(lists, global, track, first, end, parameters,
-                 [&](Displacement& record, std::int32_t f) {
-                   const track_sample& sample = global.output_at(f, track.feature);
-                   record.targetX = sample.x;
-                   record.targetY = sample.y;
-                   return true;
-                 });
+    for (std::int32_t first = track.first, end = first; first < track.last; first = end + 1) {
+      end = first;
+      while (end < track.last && member(end)) ++end;
+      append_track(lists, global, track, first, end, parameters,
+                   [&](Displacement& record, std::int32_t f) {
+                     const track_sample& sample = global.output_at(f, track.feature);
+                     record.targetX = sample.x;
+                     record.targetY = sample.y;
+                     return true;
+                   });
+    }
   }
   return lists;
 }

@@ -37,9 +37,10 @@ displacement_lists blended_displacements(
     const stabilizer_global& global, const std::vector<factorization_window>& windows,
     const SolverParamsRecord& parameters, const progress_functor& progress = [] {});
 
-// The displacements of a clip that is still being solved: for each track the frames from the first
-// whose window it takes part in to the first whose window it does not take part in, or which has no
-// window. Targets are whatever `output` holds and wait for refresh_targets.
+// The displacements of a clip that is still being solved: for each track all frames whose window it
+// takes part in. Each run of such frames fades and is linked as a track by itself, so one that
+// lives on across a gap counts on both sides of it. Targets are whatever `output` holds and wait
+// for refresh_targets.
 displacement_lists member_displacements(const stabilizer_global& global,
                                         const std::vector<factorization_window>& windows,
                                         const SolverParamsRecord& parameters);

@@ -30,6 +30,8 @@ class window_smoother {
         solver_(global, parameters, lambdas, progress) {}
 
   bool Run() {
+    while (DropWeakWindows()) {
+    }
     if (windows_.empty()) {
       Bridge(0, global_.frame_count, similarity{});
       return true;
@@ -79,6 +81,34 @@ class window_smoother {
     return windows_[w].end >= next.first ? windows_[w].end : JoinFrame(next);
   }
 
+  // Gives up the windows that a bridge follows and whose last rows hold too few tracks to lead
+  // into it; what they covered joins the gap. True where there were any: the window before one may
+  // have a gap behind it now.
+  bool DropWeakWindows() {
+    std::vector<bool> weak;
+    for (std::size_t w = 0; w < windows_.size(); ++w) {
+      weak.push_back(GapEnd(w) > windows_[w].end && !TailIsHeld(windows_[w]));
+    }
+    std::size_t w = 0;
+    if (std::erase_if(windows_, [&](const factorization_window&) { return weak[w++]; }) == 0) {
+      return false;
+    }
+    tail_warper_.reset();
+    return true;
+  }
+
+  std::uint64_t TailLength(const factorization_window& window) const {
+    return std::min<std::uint64_t>(window.end - window.first,
+                                   static_cast<std::uint64_t>(parameters_.transition_tail_overlap));
+  }
+
+  bool TailIsHeld(const factorization_window& window) {
+    for (std::uint64_t f = window.end - TailLength(window); f < window.end; ++f) {
+      if (TailWarper().displacements(f).size() < CPWarper::kLeastForProjection) return false;
+    }
+    return true;
+  }
+
   void FillOverlapRows(std::size_t w) {
     factorization_window& window = windows_[w];
     const factorization_window* previous = w == 0 ? nullptr : &windows_[w - 1];
@@ -126,8 +156,7 @@ class window_smoother {
   // The window's last rows serve the bridge cleaned of outliers, as frames that move as one, and
   // are put back afterwards.
   void BridgeGap(const factorization_window& window, std::uint64_t gap_end) {
-    const std::uint64_t tail = std::min<std::uint64_t>(
-        window.end - window.first, static_cast<std::uint64_t>(parameters_.transition_tail_overlap));
+    const std::uint64_t tail = TailLength(window);
     const std::size_t columns = global_.feature_count;
     const auto tail_begin =
         global_.output.begin() + static_cast<std::ptrdiff_t>((window.end - tail) * columns);

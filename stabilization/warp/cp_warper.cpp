@@ -17,7 +17,6 @@ namespace {
 constexpr double kWholeScore = 1e-5;     // a score this near to a whole number is that number
 constexpr double kCountedWeight = 1e-5;  // lighter displacements cannot call for the sparse solve
 constexpr double kExactSquare = 1e-8;    // squared pixels
-constexpr std::size_t kLeastForProjection = 6;
 
 // What bounds start from. The maximum is the smallest normal float, not the lowest.
 constexpr frame_bounds kNothing = {3.4028234663852886e38, 3.4028234663852886e38,

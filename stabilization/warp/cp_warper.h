@@ -38,6 +38,7 @@ class CPWarper {
  public:
   static constexpr std::int32_t kModelRampFrames = 15;    // for one step of the model
   static constexpr std::int32_t kOutlierRampFrames = 60;  // from weight 0 to 1 along a track
+  static constexpr std::size_t kLeastForProjection = 6;   // displacements of a frame
 
   CPWarper(std::int32_t frameCount, std::int32_t frameWidth, std::int32_t frameHeight);
   CPWarper& operator=(const CPWarper&) = delete;

@@ -125,14 +125,24 @@ TEST(BlendedDisplacementsTest, InsideAnOverlapTheWindowsTableSaysWhoLives) {
   for (int f = 0; f < 100; ++f) ASSERT_EQ(lists[f].size(), f < 60) << f;
 }
 
-TEST(MemberDisplacementsTest, TracksRunAsLongAsTheirWindowsListThem) {
-  stabilizer_global global = moving_clip(120, {{3, 0, 120}});
+// The first track's runs are in the windows 0 and 2, behind a gap; the others' go on up to 100.
+TEST(MemberDisplacementsTest, TracksRunWhereTheirWindowsListThem) {
+  stabilizer_global global = moving_clip(140, {{3, 0, 140}});
   for (track_sample& sample : global.output) sample.status = -1;  // nothing solved yet
-  std::vector<factorization_window> windows = {window_over(10, 60), window_over(50, 100)};
-  for (factorization_window& window : windows) window.trajectory_flags = {1, 1};
+  std::vector<factorization_window> windows = {window_over(10, 60), window_over(50, 100),
+                                               window_over(110, 130)};
+  windows[0].trajectory_flags = windows[1].trajectory_flags = {1, 1};
   windows[1].trajectories_begin = 1;
-  expect_lists(member_displacements(global, windows, {}), 3,
-               [](int f, int s) { return f >= (s == 2 ? 50 : 10) && f < (s == 0 ? 50 : 100); });
+  windows[2].trajectory_flags = {1};
+  const displacement_lists lists = member_displacements(global, windows, {});
+  expect_lists(lists, 3, [](int f, int s) {
+    return (f >= (s == 2 ? 50 : 10) && f < (s == 0 ? 50 : 100)) || (s == 0 && f >= 110 && f < 130);
+  });
+  // A run of 20 frames peaks at 20 / 200.
+  for (const auto& [f, weight] : {std::pair(110, .01), {119, .1}, {129, .01}}) {
+    ASSERT_EQ(lists[f].size(), 1u);
+    EXPECT_NEAR(lists[f][0].weight, weight, 1e-15);
+  }
 }
 
 TEST(RefreshTargetsTest, DroppedRecordsLeaveAllLinksRight) {

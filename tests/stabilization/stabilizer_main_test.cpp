@@ -138,6 +138,11 @@ stabilizer_global hole_in_the_middle() {
   return clip_of(options);
 }
 
+// Seven tracks live on across a gap, and four on each side of it do not.
+stabilizer_global across_a_gap() {
+  return shaken_clip(400, {{7, 0, 400}, {4, 0, 150}, {4, 170, 330}});
+}
+
 // The ranks at which the solve was tried again, in order.
 std::string lower_ranks(const std::string& log) {
   const std::string line = "stabilizer failed, trying lower rank ";
@@ -178,6 +183,9 @@ TEST(StabilizerMain, EveryClipComesOutCovered) {
                // 200 tracks hold 7.5 up to frame 146 and from 153 on.
                {"scene cut", shaken_clip(300, {{200, 0, 150}, {200, 150, 300}}), 1, "",
                 "0 145;153 300;", "solved 145 163;", 0.3},
+               // 11 tracks hold it up to frame 137 and from 182 to 317.
+               {"few tracks across a gap", across_a_gap(), 1, "", "0 135;182 317;",
+                "solved 135 192;solved 317 400;", 0.3},
                // 300 tracks hold it up to frame 137 and from 162 on. In a transition they keep
                // their noise of 0.1 pixels, which bends them by 0.3.
                {"hole", hole_in_the_middle(), 1, "", "0 135;162 300;",
@@ -197,6 +205,20 @@ TEST(StabilizerMain, EveryClipComesOutCovered) {
     for (std::size_t f = 1; f + 1 < clip.global.frame_count; ++f) {
       EXPECT_FALSE(median_bend(clip, blended, f) > e.bend) << "frame " << f;
     }
+  }
+}
+
+// At a lower threshold 5 tracks make a window, but they can't lead from it into a transition. The 8
+// behind them hold 2.5 from frame 191 on.
+TEST(StabilizerMain, WindowsOfFewTracksAreBridged) {
+  SolverParamsRecord parameters = params_1080p();
+  parameters.conservative_threshold = 2.5;
+  for (const bool no_motion : {false, true}) {
+    parameters.no_motion = no_motion;
+    const solved_clip clip = solve(shaken_clip(300, {{5, 0, 140}, {8, 160, 300}}), parameters);
+    EXPECT_EQ(clip.result, 1);
+    EXPECT_EQ(spans_of(clip.windows), "191 300;");
+    EXPECT_EQ(spans_of(clip.transitions), "solved 0 140;unsolved 140 160;solved 160 201;");
   }
 }
 
