@@ -25,7 +25,6 @@ struct transition {
   const progress_functor& progress;
   const trajectory_range range;
   const std::int64_t end;
-  std::int64_t overlap;
 
   // Both solve one chunk and return where the next one starts; `end` where nothing is left to do.
   std::int64_t smooth(std::int64_t chunk_first, std::int64_t chunk_end);
@@ -78,11 +77,13 @@ std::int64_t transition::smooth(std::int64_t chunk_first, std::int64_t chunk_end
     append_unsolved(records, {chunk_first, end});
     return end;
   }
+  // Every chunk reaches back over frames that are solved by then, be it by the chunk before it.
+  const std::int64_t overlap =
+      std::clamp<std::int64_t>(parameters.transition_tail_overlap, 0, chunk_first);
   std::vector<double> frame_weights(
       static_cast<std::size_t>(overlap + std::max<std::int64_t>(0, chunk_end - chunk_first)), 1.0);
   std::fill_n(frame_weights.begin(), overlap, kOverlapFrameWeight);
   const std::vector<double> smoothness(frame_weights.size(), parameters.transition_stab_lambda);
-  overlap = std::min(overlap, part.first);
   append_unsolved(records, {chunk_first, part.first});
 
   const std::int64_t base = part.first - overlap;
@@ -214,20 +215,16 @@ void transition_window(stabilizer_global& global, std::uint64_t first, std::uint
   if (first == end) return;
   const std::int64_t window_first = static_cast<std::int64_t>(first);
   const std::int64_t window_end = static_cast<std::int64_t>(end);
-  transition solve{global,
-                   parameters,
-                   translation_only,
-                   records,
-                   progress,
-                   live_trajectories(global, window_first, window_end),
-                   window_end,
-                   std::clamp<std::int64_t>(parameters.transition_tail_overlap, 0, window_first)};
+  transition solve{global,    parameters, translation_only,
+                   records,   progress,   live_trajectories(global, window_first, window_end),
+                   window_end};
   progress();
   std::int64_t chunk_first = window_first;
   bool is_first = true;
   while (chunk_first < window_end) {
-    const std::int64_t chunk_end =
+    std::int64_t chunk_end =
         chunk_first + std::min(window_end - chunk_first, parameters.transition_max_duration);
+    if (window_end - chunk_end == 1) chunk_end = window_end;  // no track spans a single frame
     chunk_first = parameters.use_new_solver
                       ? solve.smooth(chunk_first, chunk_end)
                       : solve.bundle_and_refine(chunk_first, chunk_end, is_first);

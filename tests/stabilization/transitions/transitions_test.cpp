@@ -108,7 +108,7 @@ TEST(TransitionWindow, ShakyTracksComeToAMinimumOfTheCost) {
 TEST(TransitionWindow, RecordsCoverTheStretch) {
   using clip = std::vector<lives>;
   const clip whole = {{12, 0, 130}}, hole = {{8, 0, 25}, {8, 35, 60}},
-             long_hole = {{8, 5, 40}, {8, 90, 120}};
+             long_hole = {{8, 5, 40}, {8, 90, 120}}, rest = {{12, 0, 81}};
   // Two tracks of two frames: eight residuals for eight unknowns would do, but not with ten frames
   // of overlap behind a hole.
   const clip brief = {{2, 0, 2}}, brief_behind = {{2, 30, 32}, {8, 40, 60}};
@@ -126,6 +126,7 @@ TEST(TransitionWindow, RecordsCoverTheStretch) {
       {"a hole longer than a chunk ends it", 120, 20, 0, long_hole, false,
        "unsolved 0 5;solved 5 20;solved 20 40;unsolved 40 120;"},
       {"chunks", 130, 40, 0, whole, true, "solved 0 40;solved 40 80;solved 80 120;solved 120 130;"},
+      {"a rest of one frame", 81, 40, 0, rest, true, "solved 0 40;solved 40 81;"},
       {"chunks of one frame", 10, 1, 0, {{6, 0, 10}}, false, "unsolved 0 10;"},
       {"less than none", 10, -5, 0, {{6, 0, 10}}, false, "unsolved 0 10;"},
       {"just enough residuals", 10, 200, 0, brief, false, "solved 0 2;unsolved 2 10;"},
@@ -141,6 +142,32 @@ TEST(TransitionWindow, RecordsCoverTheStretch) {
       EXPECT_EQ(spans_of(s.records), e.records);
       expect_unsolved_untouched(s.global, s.records);
     }
+  }
+}
+
+// The largest second difference along x, in pixels, of six swaying dots' stabilized paths over a
+// transition that goes from `first` to the clip's end in chunks.
+double bend_of_chunks(int first, int max_duration) {
+  scene s(120, {{6, 0, 120}});
+  for (int i = 0; i < 6 * 120; ++i) {
+    s.global.input[i].x = static_cast<float>(scattered(i % 6).x + 60 * std::sin(0.5 * (i / 6)));
+    s.global.input[i].y = static_cast<float>(scattered(i % 6).y + 40 * std::cos(0.4 * (i / 6)));
+  }
+  s.parameters.transition_max_duration = max_duration;
+  s.transition(first, 120);
+  float largest = 0;
+  for (int i = 6 * (first + 1); i < 6 * 119; ++i) {
+    const track_sample* at = &s.global.output[i];
+    largest = std::max(largest, std::fabs(at[-6].x - 2 * at->x + at[6].x));
+  }
+  return largest;
+}
+
+// As tracks turn by up to 15 pixels a frame, chunks that don't know of each other part by 11.
+TEST(TransitionWindow, ChunksJoinEachOther) {
+  for (const int first : {0, 2}) {
+    EXPECT_LT(bend_of_chunks(first, 40), 2) << first;
+    EXPECT_LT(bend_of_chunks(first, 200), 0.2) << first;
   }
 }
 
