@@ -76,7 +76,7 @@ void BM_Transition(benchmark::State& state) {
   SolverParamsRecord parameters;
   parameters.transition_max_duration = state.range(0);
   run(state, [&](stabilizer_global& global, int frames, std::vector<transition_record>& records) {
-    transition_window(global, 0, frames, parameters, false, records, [] {});
+    transition_window(global, 0, frames, parameters, 1920, 1080, false, records, [] {});
   });
   if (state.range(0) == 210 && state.range(1) == 500) state.counters["limit"] = 1000;
 }
@@ -85,7 +85,7 @@ void BM_Transition(benchmark::State& state) {
 void BM_LongTransition(benchmark::State& state) {
   const SolverParamsRecord parameters;
   run(state, [&](stabilizer_global& global, int frames, std::vector<transition_record>& records) {
-    transition_window(global, 0, frames, parameters, false, records, [] {});
+    transition_window(global, 0, frames, parameters, 1920, 1080, false, records, [] {});
   });
 }
 
@@ -94,7 +94,7 @@ void BM_BundledTransition(benchmark::State& state) {
   parameters.transition_max_duration = state.range(0);
   parameters.use_new_solver = false;
   run(state, [&](stabilizer_global& global, int frames, std::vector<transition_record>& records) {
-    transition_window(global, 0, frames, parameters, false, records, [] {});
+    transition_window(global, 0, frames, parameters, 1920, 1080, false, records, [] {});
   });
 }
 

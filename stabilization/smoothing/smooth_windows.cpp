@@ -68,8 +68,8 @@ class window_smoother {
     if (parameters_.no_motion) {
       lockdown_window(global_, first, end, parameters_, target, transitions_, progress_);
     } else {
-      transition_window(global_, first, end, parameters_, translation_only_, transitions_,
-                        progress_);
+      transition_window(global_, first, end, parameters_, width_, height_, translation_only_,
+                        transitions_, progress_);
     }
   }
 

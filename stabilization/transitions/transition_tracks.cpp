@@ -105,10 +105,14 @@ void apply_record(stabilizer_global& global, const transition_record& record) {
   }
 }
 
-void drop_rotation_and_scale(transition_record& record) {
+void reduce_to_shift(transition_record& record, point2 middle) {
   for (std::size_t i = 0; i + 3 < record.motion.size(); i += 4) {
-    record.motion[i] = 1.0;
-    record.motion[i + 1] = 0.0;
+    double* m = &record.motion[i];
+    const point2 shift = displacement_of({m[0], m[1], m[2], m[3]}, middle);
+    m[0] = 1.0;
+    m[1] = 0.0;
+    m[2] = shift.x;
+    m[3] = shift.y;
   }
 }
 

@@ -68,8 +68,9 @@ void append_solved(std::vector<transition_record>& records, const frame_range& f
                    std::vector<double> motion);
 // Takes every input sample that is live in output through its frame's map.
 void apply_record(stabilizer_global& global, const transition_record& record);
-// Scale 1, angle 0 on each frame.
-void drop_rotation_and_scale(transition_record& record);
+// Leaves of each frame's motion the shift that it gives to `middle`, the picture's: origin and
+// middle part by a rotation.
+void reduce_to_shift(transition_record& record, point2 middle);
 // The map that takes what `from` makes of a scene point to what `to` makes of it.
 similarity map_between(const similarity& from, const similarity& to);
 

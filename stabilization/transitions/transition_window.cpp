@@ -20,6 +20,7 @@ constexpr double kEndFrameWeight = 10.0;
 struct transition {
   stabilizer_global& global;
   const SolverParamsRecord& parameters;
+  const point2 middle;  // of the picture
   const bool translation_only;
   std::vector<transition_record>& records;
   const progress_functor& progress;
@@ -128,7 +129,7 @@ std::int64_t transition::smooth(std::int64_t chunk_first, std::int64_t chunk_end
                      static_cast<int>(part.end));
   append_solved(records, part, std::move(motion));
   if (translation_only) {
-    drop_rotation_and_scale(records.back());
+    reduce_to_shift(records.back(), middle);
     apply_record(global, records.back());
   }
   return part.end;
@@ -200,7 +201,7 @@ std::int64_t transition::bundle_and_refine(std::int64_t chunk_first, std::int64_
   append_unsolved(records, {chunk_first, part.first});
   append_solved(records, part, std::move(motion));
   progress();
-  if (translation_only) drop_rotation_and_scale(records.back());
+  if (translation_only) reduce_to_shift(records.back(), middle);
   apply_record(global, records.back());
   progress();
   return part.end;
@@ -209,14 +210,20 @@ std::int64_t transition::bundle_and_refine(std::int64_t chunk_first, std::int64_
 }  // namespace
 
 void transition_window(stabilizer_global& global, std::uint64_t first, std::uint64_t end,
-                       const SolverParamsRecord& parameters, bool translation_only,
-                       std::vector<transition_record>& records, const progress_functor& progress) {
+                       const SolverParamsRecord& parameters, int width, int height,
+                       bool translation_only, std::vector<transition_record>& records,
+                       const progress_functor& progress) {
   tessel::debug::Log("Transition window (%d : %d)", static_cast<int>(first), static_cast<int>(end));
   if (first == end) return;
   const std::int64_t window_first = static_cast<std::int64_t>(first);
   const std::int64_t window_end = static_cast<std::int64_t>(end);
-  transition solve{global,    parameters, translation_only,
-                   records,   progress,   live_trajectories(global, window_first, window_end),
+  transition solve{global,
+                   parameters,
+                   middle_of(width, height),
+                   translation_only,
+                   records,
+                   progress,
+                   live_trajectories(global, window_first, window_end),
                    window_end};
   progress();
   std::int64_t chunk_first = window_first;

@@ -14,10 +14,12 @@ namespace marrow::stabilization {
 
 // Solves [first, end) and appends its records, ascending in frame. Reads global.input,
 // global.trajectories and, for the frames before `first`, global.output; writes global.output.
-// translation_only drops scale and rotation.
+// width and height: the analysed frame in square pixels. translation_only leaves of each frame's
+// motion what it does to the picture's middle, as a shift.
 void transition_window(stabilizer_global& global, std::uint64_t first, std::uint64_t end,
-                       const SolverParamsRecord& parameters, bool translation_only,
-                       std::vector<transition_record>& records, const progress_functor& progress);
+                       const SolverParamsRecord& parameters, int width, int height,
+                       bool translation_only, std::vector<transition_record>& records,
+                       const progress_functor& progress);
 
 // Ties every frame of [first, end) to `target`.
 void lockdown_window(stabilizer_global& global, std::uint64_t first, std::uint64_t end,

@@ -9,6 +9,7 @@
 #include "platform/tessel/debug.h"
 #include "stabilization/models/inverse_bilinear.h"
 #include "stabilization/models/robust_pass.h"
+#include "stabilization/models/similarity.h"
 #include "stabilization/warp/grid_solver.h"
 
 namespace marrow::stabilization {
@@ -136,7 +137,9 @@ matrix3 CPWarper::fitKind(std::size_t frame, int kind) {
       tessel::debug::Log("translation ");
       if (!overrideFlags_[frame]) return fitTranslation(list);
       const double* p = &overrideParams_[4 * frame];
-      return {1, 0, p[2], 0, 1, p[3], 0, 0, 1};
+      const point2 shift =
+          displacement_of({p[0], p[1], p[2], p[3]}, middle_of(frameWidth_, frameHeight_));
+      return {1, 0, shift.x, 0, 1, shift.y, 0, 0, 1};
     }
     case 2:
       tessel::debug::Log("similarity ");
