@@ -87,40 +87,28 @@ bool window_solver::solve_window() {
 
 bool window_solver::solve_window_no_motion() {
   Begin();
-  const factorization_window& window = *current_window_;
-  const std::size_t overlap = window.overlap_end - window.first;
-  const bool first_window = previous_window_ == current_window_;
-  const std::size_t middle = length_ / 2;
+  const std::size_t overlap = current_window_->overlap_end - current_window_->first;
+  const auto is_anchored = [&](const active_track& track) {
+    return overlap > 0 && track.first == 0 && HasOverlapSample(track, 0);
+  };
+  // With nothing solved before it that it could hold on to, the window stands as its middle does.
+  const bool stands_alone = std::none_of(loaded_.tracks.begin(), loaded_.tracks.end(), is_anchored);
   for (const active_track& track : loaded_.tracks) {
     FillOuterProduct(track);
     progress_();
-    const bool anchored = overlap > 0 && track.first == 0 && HasOverlapSample(track, 0);
-    double x = 0, y = 0;
-    if (!first_window) {
-      if (anchored) {
-        x = OverlapSample(track, 0).x;
-        y = OverlapSample(track, 0).y;
-      }
-    } else if (track.first <= middle && middle < track.end) {
-      const track_sample& sample = global_.input_at(window.first + middle, Feature(track));
-      x = sample.x;
-      y = sample.y;
-    } else {
-      x = parameters_.center_x;
-      y = parameters_.center_y;
-      for (std::size_t i = 0; i < rank_; ++i) {
-        const double signal = window.basis[i * length_ + middle];
-        x += track.coefficients[i] * signal;
-        y += track.coefficients[rank_ + i] * signal;
-      }
+    const bool anchored = is_anchored(track);
+    point2 target = {0, 0};
+    if (anchored) {
+      target = {OverlapSample(track, 0).x, OverlapSample(track, 0).y};
+    } else if (stands_alone) {
+      target = MiddlePosition(track);
     }
     for (std::size_t f = track.first; f < track.end; ++f) {
       const double fade = track.fade[f - track.first];
       const double w = fade * fade * frame_norm_[f];
-      if (first_window || anchored) AddData(track, f, w, x, y);
+      if (stands_alone || anchored) AddData(track, f, w, target.x, target.y);
       if (anchored && f < overlap) {
-        const track_sample& solved = OverlapSample(track, 0);
-        AddData(track, f, w * kOverlapWeight, solved.x, solved.y);
+        AddData(track, f, w * kOverlapWeight, target.x, target.y);
       }
       if (f + 1 < track.end) {
         const double l = kStillnessLambda * fade;
@@ -173,6 +161,22 @@ const track_sample& window_solver::OverlapSample(const active_track& track,
 bool window_solver::HasOverlapSample(const active_track& track, std::size_t frame) const {
   if (overlap_from_transition) return OverlapSample(track, frame).status >= 0;
   return previous_window_->takes_part(track.trajectory);
+}
+
+// Where the track is on the window's middle frame, or would be if it lived there.
+point2 window_solver::MiddlePosition(const active_track& track) const {
+  const std::size_t middle = length_ / 2;
+  if (track.first <= middle && middle < track.end) {
+    const track_sample& sample = global_.input_at(current_window_->first + middle, Feature(track));
+    return {sample.x, sample.y};
+  }
+  point2 position = {parameters_.center_x, parameters_.center_y};
+  for (std::size_t i = 0; i < rank_; ++i) {
+    const double signal = current_window_->basis[i * length_ + middle];
+    position.x += track.coefficients[i] * signal;
+    position.y += track.coefficients[rank_ + i] * signal;
+  }
+  return position;
 }
 
 void window_solver::FillOuterProduct(const active_track& track) {

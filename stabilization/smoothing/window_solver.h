@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "stabilization/factorization/active_track.h"
+#include "stabilization/models/matrix3.h"
 #include "stabilization/progress.h"
 #include "stabilization/solve_records.h"
 #include "stabilization/solver_params.h"
@@ -20,9 +21,10 @@ namespace marrow::stabilization {
 //   fade^2 norm 100 (1 - f / L) |p - q|^2    f < L             agree with the solved overlap rows q
 //   (lambda fade)^2 norm |p[f-1] - 2 p[f] + p[f+1]|^2          be smooth
 // and 0.01 |u[f]|^2 on frames with fewer tracks than the rank. One sparse symmetric system whose
-// matrix reaches two blocks of rank x rank off the diagonal. In the No Motion form o is one fixed
-// place for the whole track, q is that of the overlap's first row with weight 100 throughout, and
-// the smoothness is 2000 fade times the first difference.
+// matrix reaches two blocks of rank x rank off the diagonal. In the No Motion form o and q are
+// the track's place on the overlap's first row, with weight 100 throughout, and a track without one
+// has no such terms; where none has one, o is its place on the window's middle frame. The
+// smoothness is 2000 fade times the first difference.
 //
 // A matrix that is not positive definite is a failure and stays one: tracks of lower rank than the
 // solve's make it so, and the caller then lowers the rank. Nothing is added to the diagonal to save
@@ -50,6 +52,7 @@ class window_solver {
 
  private:
   void Begin();
+  point2 MiddlePosition(const active_track& track) const;
   void FillOuterProduct(const active_track& track);
   void AddData(const active_track& track, std::size_t frame, double weight, double x, double y);
   void AddOuterProduct(std::vector<double>& blocks, std::size_t frame, double weight);

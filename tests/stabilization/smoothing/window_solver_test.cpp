@@ -82,7 +82,7 @@ class WindowSolverTest : public ::testing::Test {
   }
 
   // One coordinate of one track, as the header states it.
-  void AddTrack(dense_reference& dense, std::size_t k, int axis, bool no_motion, bool first_window,
+  void AddTrack(dense_reference& dense, std::size_t k, int axis, bool no_motion,
                 const std::vector<double>& norm) const {
     const Trajectory& t = global_.trajectories[k];
     const double* c = &window_.coefficients[k * 2 * kRank + axis * kRank];
@@ -92,7 +92,7 @@ class WindowSolverTest : public ::testing::Test {
     const auto solved = [&](std::size_t f) { return of(window_.overlap_rows[f * 8 + t.feature]); };
     const std::size_t overlap = window_.overlap_end - kFirst;
     const bool anchored = overlap > 0 && Alive(k, 0) && HasOverlap(k, 0);
-    double still = 0;  // where the first window's tracks are to stand
+    double still = 0;  // where the tracks of a window without overlap are to stand
     for (std::size_t i = 0; i < kRank; ++i) still += c[i] * window_.basis[i * kLength + 7];
     if (Alive(k, 7)) still = seen(7);
     for (std::size_t f = 0; f < kLength; ++f) {
@@ -110,8 +110,8 @@ class WindowSolverTest : public ::testing::Test {
         }
         continue;
       }
-      if (first_window) dense.add(w, here, still);
-      if (!first_window && anchored) dense.add(w, here, solved(0));
+      if (overlap == 0) dense.add(w, here, still);
+      if (anchored) dense.add(w, here, solved(0));
       if (anchored && f < overlap) dense.add(100 * w, here, solved(0));
       if (Alive(k, f + 1)) dense.add(w * 2000 * 2000, Terms(c, {{f, 1}, {f + 1, -1}}), 0);
     }
@@ -132,7 +132,7 @@ class WindowSolverTest : public ::testing::Test {
       }
     }
     for (std::size_t k = 0; k < 8; ++k) {
-      for (const int axis : {0, 1}) AddTrack(dense, k, axis, no_motion, first_window, norm);
+      for (const int axis : {0, 1}) AddTrack(dense, k, axis, no_motion, norm);
     }
 
     window_solver solver(global_, parameters_, lambdas_, kNoProgress);
