@@ -4,6 +4,10 @@
 
 namespace marrow::stabilization {
 
+// The default of transition_bisquare_sigma: transitions trust all tracks alike, as they did before
+// that number had a meaning, so that saved work comes out as it was.
+inline constexpr double kTrustAllTracks = 5.0;
+
 // Every number that rules a solve. Durations, steps and overlaps in frames; lengths in square
 // pixels of the analysed frame unless told otherwise. Filled anew each time a solve may start.
 struct SolverParamsRecord {
@@ -27,7 +31,10 @@ struct SolverParamsRecord {
   std::int64_t max_factorization_frames = 300;
   std::int64_t max_transition_iterations = 10;
   std::int64_t transition_min_observations = 1;
-  double transition_bisquare_sigma = 5.0;  // held, not used
+  // Unless kTrustAllTracks: how far a track may leave the others within a frame before it counts
+  // less in a transition, pixels of a picture 1000 wide; and transitions don't turn or resize
+  // frames that few tracks hold. See transition_window.
+  double transition_bisquare_sigma = kTrustAllTracks;
   bool use_new_solver = true;
   std::int64_t transition_max_duration = 200;
   double transition_stab_lambda = 100.0;

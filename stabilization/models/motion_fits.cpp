@@ -133,6 +133,12 @@ matrix3 fitHomography(std::span<const Displacement> list) {
   return homography_fitter().fit(list);
 }
 
+double distance_off(const matrix3& motion, const Displacement& d) {
+  const point2 image = transform(motion, {d.sourceX, d.sourceY});
+  const double dx = image.x - d.targetX, dy = image.y - d.targetY;
+  return std::sqrt(dx * dx + dy * dy);
+}
+
 double entry_distance(const matrix3& a, const matrix3& b) {
   double sum = 0;
   for (std::size_t i = 0; i < a.size(); ++i) sum += std::fabs(a[i] - b[i]);

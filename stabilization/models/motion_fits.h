@@ -37,6 +37,9 @@ class homography_fitter {
 
 matrix3 fitHomography(std::span<const Displacement> list);
 
+// How far, in pixels, the motion takes the source from the target.
+double distance_off(const matrix3& motion, const Displacement& d);
+
 // Sum of the nine absolute differences; NaN where either is not finite.
 double entry_distance(const matrix3& a, const matrix3& b);
 

@@ -21,11 +21,7 @@ double medianDeviation(std::span<Displacement> list) {
   const matrix3 fit = fitSimilarity(list);
   std::vector<double> residuals;
   residuals.reserve(list.size());
-  for (const Displacement& d : list) {
-    const point2 image = transform(fit, {d.sourceX, d.sourceY});
-    const double dx = image.x - d.targetX, dy = image.y - d.targetY;
-    residuals.push_back(std::sqrt(dx * dx + dy * dy));
-  }
+  for (const Displacement& d : list) residuals.push_back(distance_off(fit, d));
   std::vector<double> sorted = residuals;
   const auto middle = sorted.begin() + static_cast<std::ptrdiff_t>(sorted.size() / 2);
   std::nth_element(sorted.begin(), middle, sorted.end(), [](double a, double b) {

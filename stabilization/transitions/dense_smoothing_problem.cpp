@@ -50,6 +50,16 @@ void dense_smoothing_problem::set_columns(double* columns, int frames, int frame
   row_y[3] = ty.y;
 }
 
+void dense_smoothing_problem::hold(const std::vector<bool>& held) {
+  for (const block& b : blocks_) {
+    const std::size_t columns = static_cast<std::size_t>(4 * b.frames);
+    double* j = &jacobian_[b.jacobian];
+    for (std::size_t k = 0; k < columns; ++k) {
+      if (held[static_cast<std::size_t>(4 * b.first_frame) + k]) j[k] = j[columns + k] = 0;
+    }
+  }
+}
+
 std::vector<frame_unknowns> dense_smoothing_problem::unpack(const double* x) const {
   std::vector<frame_unknowns> frames;
   frames.reserve(static_cast<std::size_t>(frames_));

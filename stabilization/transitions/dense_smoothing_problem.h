@@ -77,6 +77,8 @@ class dense_smoothing_problem {
 
   // Where block i's 2 x (4 * frames) numbers lie.
   double* jacobian(std::size_t i) { return &jacobian_[blocks_[i].jacobian]; }
+  // Takes the derivatives by the unknowns u with held[u] out of J: they stay as they start.
+  void hold(const std::vector<bool>& held);
   // Derivatives of one frame's stretch of a block: columns scale, angle, tx, ty.
   static void set_columns(double* columns, int frames, int frame, point2 scale, point2 angle,
                           point2 tx, point2 ty);

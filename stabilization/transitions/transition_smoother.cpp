@@ -1,5 +1,7 @@
 #include "stabilization/transitions/transition_smoother.h"
 
+#include <utility>
+
 namespace marrow::stabilization {
 namespace {
 
@@ -37,8 +39,9 @@ point2 translation_difference(const frame_unknowns& before, const frame_unknowns
 }  // namespace
 
 transition_smoother::transition_smoother(std::int64_t frames,
-                                         const std::vector<smoothing_track>& tracks)
-    : tracks_(tracks) {
+                                         const std::vector<smoothing_track>& tracks,
+                                         std::vector<bool> held)
+    : tracks_(tracks), held_(std::move(held)) {
   try {
     start_blocks(frames);
     for (const smoothing_track& track : tracks_) {
@@ -106,6 +109,7 @@ void transition_smoother::compute_sparse_jacobian(const double* x, const double*
                   tx, ty);
     }
   }
+  if (!held_.empty()) hold(held_);
 }
 
 }  // namespace marrow::stabilization

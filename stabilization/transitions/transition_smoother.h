@@ -20,14 +20,17 @@ struct smoothing_track {
 // ws R(-angle) (T-(o-) + T+(o+) - 2 T(o)) / scale.
 class transition_smoother : public dense_smoothing_problem {
  public:
-  // Keeps `tracks` by reference. A failure to allocate sets `failed`.
-  transition_smoother(std::int64_t frames, const std::vector<smoothing_track>& tracks);
+  // Keeps `tracks` by reference. held: empty, or for each of the four numbers of each frame whether
+  // it stays as it starts. A failure to allocate sets `failed`.
+  transition_smoother(std::int64_t frames, const std::vector<smoothing_track>& tracks,
+                      std::vector<bool> held = {});
 
   void compute_cost(const double* x, double* f) override;
   void compute_sparse_jacobian(const double* x, const double* f) override;
 
  private:
   const std::vector<smoothing_track>& tracks_;
+  const std::vector<bool> held_;
 };
 
 }  // namespace marrow::stabilization

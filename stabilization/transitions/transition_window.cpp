@@ -7,6 +7,7 @@
 #include "stabilization/transitions/transition_smoother.h"
 #include "stabilization/transitions/transition_tracks.h"
 #include "stabilization/transitions/transitions.h"
+#include "stabilization/transitions/wild_steps.h"
 
 namespace marrow::stabilization {
 namespace {
@@ -16,11 +17,14 @@ constexpr std::int64_t kLeastTracks = 2;
 // How much more a frame counts that is solved already and that the path must join up with.
 constexpr double kOverlapFrameWeight = 100.0;
 constexpr double kEndFrameWeight = 10.0;
+// Fewer live tracks than these don't turn or resize a frame where tracks are not all trusted.
+constexpr std::int64_t kLeastToTurn = 6;
 
 struct transition {
   stabilizer_global& global;
   const SolverParamsRecord& parameters;
-  const point2 middle;  // of the picture
+  const int width;
+  const int height;
   const bool translation_only;
   std::vector<transition_record>& records;
   const progress_functor& progress;
@@ -30,6 +34,17 @@ struct transition {
   // Both solve one chunk and return where the next one starts; `end` where nothing is left to do.
   std::int64_t smooth(std::int64_t chunk_first, std::int64_t chunk_end);
   std::int64_t bundle_and_refine(std::int64_t chunk_first, std::int64_t chunk_end, bool is_first);
+
+  bool trusts_all_tracks() const { return parameters.transition_bisquare_sigma == kTrustAllTracks; }
+
+  // No track has a stabilized place on the frame before: there the picture is as it was shot.
+  bool starts_afresh(std::int64_t frame) const {
+    if (frame == 0) return false;
+    const auto row =
+        global.output.begin() + (frame - 1) * static_cast<std::ptrdiff_t>(global.feature_count);
+    return std::all_of(row, row + static_cast<std::ptrdiff_t>(global.feature_count),
+                       [](const track_sample& sample) { return sample.status < 0; });
+  }
 
   // On every frame of [first, end) the track's output sample is there and none after `start`
   // begins anew.
@@ -78,9 +93,11 @@ std::int64_t transition::smooth(std::int64_t chunk_first, std::int64_t chunk_end
     append_unsolved(records, {chunk_first, end});
     return end;
   }
+  const bool from_identity = !trusts_all_tracks() && starts_afresh(part.first);
   // Every chunk reaches back over frames that are solved by then, be it by the chunk before it.
   const std::int64_t overlap =
-      std::clamp<std::int64_t>(parameters.transition_tail_overlap, 0, chunk_first);
+      from_identity ? 0
+                    : std::clamp<std::int64_t>(parameters.transition_tail_overlap, 0, chunk_first);
   std::vector<double> frame_weights(
       static_cast<std::size_t>(overlap + std::max<std::int64_t>(0, chunk_end - chunk_first)), 1.0);
   std::fill_n(frame_weights.begin(), overlap, kOverlapFrameWeight);
@@ -110,9 +127,19 @@ std::int64_t transition::smooth(std::int64_t chunk_first, std::int64_t chunk_end
     }
   }
 
+  std::vector<bool> held;
+  if (!trusts_all_tracks()) {
+    weigh_down_wild_steps(tracks, frames, parameters.transition_bisquare_sigma * width / 1000);
+    for (std::int64_t g = 0; g < frames; ++g) {
+      const bool all = from_identity && g == 0;
+      const bool few = all || count[static_cast<std::size_t>(g)] < kLeastToTurn;
+      held.insert(held.end(), {few, few, all, all});
+    }
+  }
+
   std::vector<double> motion;
   for (std::int64_t g = 0; g < frames; ++g) motion.insert(motion.end(), {1.0, 0.0, 0.0, 0.0});
-  transition_smoother smoother(frames, tracks);
+  transition_smoother smoother(frames, tracks, std::move(held));
   if (!smoother.solve(motion, parameters.max_transition_iterations, progress)) {
     append_unsolved(records, part);
     return part.end;
@@ -129,7 +156,7 @@ std::int64_t transition::smooth(std::int64_t chunk_first, std::int64_t chunk_end
                      static_cast<int>(part.end));
   append_solved(records, part, std::move(motion));
   if (translation_only) {
-    reduce_to_shift(records.back(), middle);
+    reduce_to_shift(records.back(), middle_of(width, height));
     apply_record(global, records.back());
   }
   return part.end;
@@ -201,7 +228,7 @@ std::int64_t transition::bundle_and_refine(std::int64_t chunk_first, std::int64_
   append_unsolved(records, {chunk_first, part.first});
   append_solved(records, part, std::move(motion));
   progress();
-  if (translation_only) reduce_to_shift(records.back(), middle);
+  if (translation_only) reduce_to_shift(records.back(), middle_of(width, height));
   apply_record(global, records.back());
   progress();
   return part.end;
@@ -217,14 +244,10 @@ void transition_window(stabilizer_global& global, std::uint64_t first, std::uint
   if (first == end) return;
   const std::int64_t window_first = static_cast<std::int64_t>(first);
   const std::int64_t window_end = static_cast<std::int64_t>(end);
-  transition solve{global,
-                   parameters,
-                   middle_of(width, height),
-                   translation_only,
-                   records,
-                   progress,
-                   live_trajectories(global, window_first, window_end),
-                   window_end};
+  transition solve{
+      global,           parameters, width,    height,
+      translation_only, records,    progress, live_trajectories(global, window_first, window_end),
+      window_end};
   progress();
   std::int64_t chunk_first = window_first;
   bool is_first = true;

@@ -221,6 +221,50 @@ TEST(TransitionWindow, TranslationOnlyHoldsInRecordsAndOutput) {
   }
 }
 
+// The motion of ten frames of 40 tracks, of which one jumps by `jump` pixels on the last frame.
+std::vector<double> motion_with_jump(double jump, double sigma) {
+  scene s(10, {{40, 0, 10}});
+  s.global.input[9 * 40 + 7].x += static_cast<float>(jump);
+  s.parameters.transition_bisquare_sigma = sigma;
+  s.transition(0, 10);
+  EXPECT_EQ(spans_of(s.records), "solved 0 10;");
+  return s.records[0].motion;
+}
+
+// Behind frames without tracks, and where only three of nine tracks live.
+TEST(TransitionWindow, FewTracksNeitherTurnNorResizeAFrameWhereSigmaIsSet) {
+  for (const double sigma : {kTrustAllTracks, 4.0}) {
+    scene s(60, {{3, 30, 60}, {6, 30, 50}});
+    s.parameters.transition_bisquare_sigma = sigma;
+    s.transition(20, 60);
+    EXPECT_EQ(spans_of(s.records), "unsolved 20 30;solved 30 60;");
+    const auto is = [&](int f, std::vector<double> numbers) {
+      return std::equal(numbers.begin(), numbers.end(), &s.records[1].motion[4 * (f - 30)]);
+    };
+    EXPECT_EQ(is(30, {1, 0, 0, 0}), sigma == 4);
+    EXPECT_FALSE(is(31, {1, 0}));
+    EXPECT_FALSE(is(49, {1, 0}));
+    for (int f = 50; f < 60; ++f) EXPECT_EQ(is(f, {1, 0}), sigma == 4) << f;
+  }
+}
+
+// How far two motions differ at most: at a distance of 500 pixels about the origin.
+double apart(const std::vector<double>& a, const std::vector<double>& b) {
+  double largest = 0;
+  for (std::size_t k = 0; k < a.size(); ++k) {
+    largest = std::max(largest, std::fabs(a[k] - b[k]) * (k % 4 < 2 ? 500 : 1));
+  }
+  return largest;
+}
+
+TEST(TransitionWindow, TracksThatJumpCountLessWhereSigmaIsSet) {
+  const std::vector<double> clean = motion_with_jump(0, kTrustAllTracks);
+  EXPECT_EQ(motion_with_jump(0, 4), clean);
+  // A sigma of 4 is 7.68 pixels here.
+  EXPECT_GT(apart(motion_with_jump(80, kTrustAllTracks), clean), 1);
+  EXPECT_LT(apart(motion_with_jump(80, 4), clean), 0.1);
+}
+
 TEST(LockdownWindow, TracksStandStillAtTheTarget) {
   for (const similarity& goal : {similarity{}, similarity{1.1, 0.2, 30, -20}}) {
     scene s(40, {{20, 0, 40}});
