@@ -253,22 +253,23 @@ CurrentFrame AnalysisEffect::GetCurrentFrame(bool clamped) try {
   const AnalysisState* const state = GetState();
   if (state == nullptr || state->table().frame_count <= 0) return {};
   const HX_InData& in = *context().in;
-  std::int32_t start = 0;
-  {
-    const kelp::effect::ScopedSuite<HX_UtilitySuite> suite(context(), HX_UTILITY_SUITE_VERSION_3);
-    ThrowIfFailed(suite->GetStartFrame(in.effect_ref, &start));
-  }
+  const std::int64_t start = GetLayerStart(*state);
   std::int32_t time = in.current_time;
   if (clamped) time = std::max(std::min(time, in.total_time), 0);
-  const std::int64_t start_row =
-      std::int64_t{std::max(start, 0)} * (CountsFields(state->result->job_input) ? 2 : 1);
   const std::int64_t frame =
-      FloorSteps({time, in.time_scale}, RowDuration(state->result->job_input)) + start_row;
-  const std::int64_t last = state->table().frame_count + start_row - 1;
+      FloorSteps({time, in.time_scale}, RowDuration(state->result->job_input)) + start;
+  const std::int64_t last = state->table().frame_count + std::max<std::int64_t>(start, 0) - 1;
   return {true, std::clamp<std::int64_t>(frame, 0, last)};
 } catch (...) {
   kelp::effect::ClearMessage(context());
   return {};
+}
+
+std::int64_t AnalysisEffect::GetLayerStart(const AnalysisState& state) {
+  std::int32_t start = 0;
+  const kelp::effect::ScopedSuite<HX_UtilitySuite> suite(context(), HX_UTILITY_SUITE_VERSION_3);
+  ThrowIfFailed(suite->GetStartFrame(context().in->effect_ref, &start));
+  return std::int64_t{start} * (CountsFields(state.result->job_input) ? 2 : 1);
 }
 
 StatusRecord AnalysisEffect::GetStatusRecord() {

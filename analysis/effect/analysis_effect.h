@@ -146,6 +146,9 @@ class AnalysisEffect : public kelp::effect::GenericEffect {
   // The frame of the call's time, which is limited to the layer first if `clamped`. Invalid without
   // a state, without frames, and where the host can't tell; never throws.
   CurrentFrame GetCurrentFrame(bool clamped);
+  // Index of the layer's first frame as CurrentFrame counts, with the state's fields; negative
+  // where the layer begins before its media. Host codes are thrown.
+  std::int64_t GetLayerStart(const AnalysisState& state);
   // Of the current frame.
   StatusRecord GetStatusRecord();
   // Whether an analysis would give now what the state holds. A state without frames is never

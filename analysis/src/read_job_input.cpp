@@ -39,8 +39,10 @@ JobInput ReadJobInput(HX_InData* host_in, HX_OutData* host_out) {
   ThrowIfFailed(suite->GetTicksPerFrame(host_in->effect_ref, &ticks));
   if (ticks <= 0) throw std::int32_t{HX_ERR_UNKNOWN};
   input.StepTime = Reduced(ticks, HX_TICKS_PER_SECOND);
+  // Before its first frame the media has nothing to analyse.
   input.StartTime = input.StepTime * std::max(start, 0);
-  input.Duration = input.StepTime * count;
+  input.Duration =
+      input.StepTime * std::max<std::int64_t>(std::int64_t{count} + std::min(start, 0), 0);
   return input;
 }
 

@@ -134,7 +134,8 @@ TEST_F(Tour, ClipsOfAnyKindComeToAnEnd) {
     EXPECT_TRUE(effect.TakeMessages().empty());
     const bool fields = clip.field_type != HX_FIELD_PROGRESSIVE;
     const auto data = DataOf(effect.opaque_data());
-    EXPECT_EQ(data[0], (fields ? 2 : 1) * layer->state()->length);
+    // Of a layer that begins before its media what the media has.
+    EXPECT_EQ(data[0], (fields ? 2 : 1) * (layer->state()->length + std::min(clip.start, 0)));
     EXPECT_EQ(data[1], (fields ? 2 : 1) * std::max(clip.start, 0));
     const auto renderer = effect.MakeRenderer();
     for (const bool direct : {false, true}) {

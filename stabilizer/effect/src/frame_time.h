@@ -20,7 +20,7 @@ HostTime FrameTime(std::int64_t frame, const analysis::RationalTime& duration);
 
 // From absolute indices of the analysis to times of the layer.
 struct FrameClock {
-  std::int64_t layer_start = 0;     // index of the layer's first frame
+  std::int64_t layer_start = 0;     // index of the layer's first frame; may be negative
   analysis::RationalTime duration;  // of one frame of the analysis
 
   HostTime At(std::int64_t frame) const { return FrameTime(frame - layer_start, duration); }

@@ -6,7 +6,6 @@
 #include "analysis/effect/analysis_ui_data.h"
 #include "analysis/effect/banner.h"
 #include "analysis/effect/effect_parameters.h"
-#include "analysis/src/read_job_input.h"
 #include "effect/suite.h"
 #include "platform/hx/hx_exports.h"
 #include "stabilizer/effect/src/fcd_table.h"
@@ -131,10 +130,7 @@ std::int64_t RenderService::PlanMargin(const StabilizerState& state) {
 }
 
 FrameClock RenderService::ClockOf(const StabilizerState& state) {
-  const analysis::JobInput present = analysis::ReadJobInput(context_.in, context_.out);
-  const analysis::JobInput& analysed = state.result->job_input;
-  const std::int64_t start = analysis::FloorSteps(present.StartTime, present.StepTime);
-  return {analysis::CountsFields(analysed) ? 2 * start : start, analysis::RowDuration(analysed)};
+  return {effect_.GetLayerStart(state), analysis::RowDuration(state.result->job_input)};
 }
 
 void RenderService::Plan(HX_PlanExtra& plan) {

@@ -81,7 +81,8 @@ TEST(AnalysisEffectTest, TheCurrentFrameIsTheLayersTimeBehindItsInPoint) {
       {10, -30, true, 10},   // the layer's first
       {10, -30, false, 0},   // -15 + 10 is before all frames
       {10, 500, false, 29},  // the last analysed one is repeated
-      {-3, 2, true, 1},      // an in-point before the media counts as 0
+      {-3, 12, true, 3},     // three frames lie before the media
+      {-3, 2, true, 0},
   };
   for (const auto& c : cases) {
     EXPECT_EQ(frame_at(c.start, c.time, c.clamped).frame, c.frame) << c.start << " " << c.time;

@@ -36,6 +36,13 @@ TEST(AnalysisServiceTest, AnAppliedEffectAnalysesItsClipByItself) {
   EXPECT_EQ(hosted.host().user_interface().refreshes(), refreshes + 2) << "for tracks and warps";
 }
 
+TEST(AnalysisServiceTest, OfALayerThatBeginsBeforeItsMediaTheMediaIsAnalysed) {
+  HostedEffect hosted(SmallClip("begins before", 8));
+  hosted.Place(-3, 11);
+  EXPECT_EQ(hosted.Analyse(), 8);
+  ExpectButtons(hosted, false, false);
+}
+
 TEST(AnalysisServiceTest, WhatCantBeLearntUpstreamOffersAnalyzeAndIsNoError) {
   HostedEffect hosted(SmallClip());
   ASSERT_EQ(hosted.Analyse(), 8);

@@ -148,6 +148,7 @@ TEST_F(ValidityTest, ReadsTheLayersSpan) {
   });
   input = Input();
   EXPECT_EQ(input.StartTime.numerator, 0);
+  EXPECT_EQ(FloorSteps(input.Duration, input.StepTime), 15) << "of 20, from the media's first on";
   EXPECT_EQ(input.FieldType, 2);
   EXPECT_TRUE(input.ProjectPath.empty() && input.SourceID.IsNil());
 

@@ -48,6 +48,13 @@ TEST_F(RenderServiceTest, APlanOrdersItsFrameAndTheMarginWithinTheClip) {
   hosted().Refuse("");
 }
 
+TEST_F(RenderServiceTest, ALayerThatBeginsBeforeItsMediaShowsEachFrameThroughItsOwnWarp) {
+  Solve({{0, 0}, {2, 2}, {10, 6}, {0, 0}}, {{kFraming, 1}});
+  hosted().Place(-1, 5);
+  const auto third = DrawBoth(Whole(3));  // frame 2 of the source
+  ExpectShown(*third, 26, 18, 30 - 10 - 0.5, 20 - 6 - 0.5);
+}
+
 // A pixel of the output shows the source half a pixel up and left of where its warp comes from.
 TEST_F(RenderServiceTest, DrawsTheWarpAtEveryDepthOnBothPaths) {
   Solve(kTwoFrames, {{kFraming, 1}});
