@@ -258,7 +258,10 @@ CurrentFrame AnalysisEffect::GetCurrentFrame(bool clamped) try {
   if (clamped) time = std::max(std::min(time, in.total_time), 0);
   const std::int64_t frame =
       FloorSteps({time, in.time_scale}, RowDuration(state->result->job_input)) + start;
-  const std::int64_t last = state->table().frame_count + std::max<std::int64_t>(start, 0) - 1;
+  // Whatever was done to the layer since, an analysed frame stands for itself.
+  const marrow::tracking::AllFeatures& table = state->table();
+  const std::int64_t last =
+      table.frame_count + std::max<std::int64_t>({start, table.first_frame, 0}) - 1;
   return {true, std::clamp<std::int64_t>(frame, 0, last)};
 } catch (...) {
   kelp::effect::ClearMessage(context());

@@ -143,8 +143,9 @@ class AnalysisEffect : public kelp::effect::GenericEffect {
   virtual void AttachSharedData(bool skip_publish);
   virtual bool DetachSharedData();
 
-  // The frame of the call's time, which is limited to the layer first if `clamped`. Invalid without
-  // a state, without frames, and where the host can't tell; never throws.
+  // The frame of the call's time, which is limited to the layer first if `clamped`; at most the
+  // last analysed one, or that counted from the layer's start. Invalid without a state, without
+  // frames, and where the host can't tell; never throws.
   CurrentFrame GetCurrentFrame(bool clamped);
   // Index of the layer's first frame as CurrentFrame counts, with the state's fields; negative
   // where the layer begins before its media. Host codes are thrown.

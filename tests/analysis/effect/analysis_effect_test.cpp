@@ -81,6 +81,7 @@ TEST(AnalysisEffectTest, TheCurrentFrameIsTheLayersTimeBehindItsInPoint) {
       {10, -30, true, 10},   // the layer's first
       {10, -30, false, 0},   // -15 + 10 is before all frames
       {10, 500, false, 29},  // the last analysed one is repeated
+      {2, 40, true, 22},     // an in-point that was moved forward leaves the analysed ones apart
       {-3, 12, true, 3},     // three frames lie before the media
       {-3, 2, true, 0},
   };
