@@ -152,6 +152,8 @@ class AnalysisEffect : public kelp::effect::GenericEffect {
   std::int64_t GetLayerStart(const AnalysisState& state);
   // Of the current frame.
   StatusRecord GetStatusRecord();
+  // What the state holds, to what an analysis would give now. Never throws, and leaves no message.
+  Validity GetValidity(AnalysisState& state);
   // Whether an analysis would give now what the state holds. A state without frames is never
   // current, nor is none. Never throws, and leaves no message about it.
   bool IsAnalysisCurrent(AnalysisState* state);

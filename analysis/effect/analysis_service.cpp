@@ -58,13 +58,16 @@ void AnalysisEffect::UpdateStartStopButtonEnablement(bool analyze_enabled, bool 
   if (state != nullptr) state->button_identity = identity;
 }
 
-bool AnalysisEffect::IsAnalysisCurrent(AnalysisState* state) {
-  if (state == nullptr) return false;
+Validity AnalysisEffect::GetValidity(AnalysisState& state) {
   const PresentInputs present{
       [this] { return ReadJobInput(context().in, context().out); },
       [this] { return GetIdentifierForTracker(GetSelectorParams(), GetTrackerParams()); },
       [this] { return GetUpstreamIdentifier(context().in, context().out); }};
-  return analysis::IsAnalysisCurrent(*state, present, context().out);
+  return analysis::GetValidity(state, present, context().out);
+}
+
+bool AnalysisEffect::IsAnalysisCurrent(AnalysisState* state) {
+  return state != nullptr && GetValidity(*state) == Validity::Current;
 }
 
 bool AnalysisEffect::IsBusy() {

@@ -39,6 +39,7 @@ bool AnalysisState::TakeResults() {
     next.job_input = analyzer->record().job_input_parameters;
     next.tracker_identity = analyzer->GetTrackerGuid();
   });
+  source_changed = false;
   MakeResultIdentityUnique();
   return true;
 }

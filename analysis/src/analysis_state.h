@@ -52,6 +52,9 @@ class AnalysisState {
   tessel::utility::Guid deletion_identity;  // of the tracks that the user deleted
 
   bool analysis_pending = false;
+  // Another source stands under the effect than the result is of. Found out by the idle step, which
+  // may ask the host's graph; renders know it from there.
+  bool source_changed = false;
   // From the start of an analysis until what is made from its results is done once.
   bool first_analysis = false;
   // A render's copy of the state of another instance, whose jobs it leaves alone.

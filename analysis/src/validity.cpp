@@ -14,21 +14,25 @@ Guid IdentifierWithoutPath(JobInput input) {
   return GetIdentifierForJobInput(input);
 }
 
-bool FitsInputs(AnalysisState& state, const PresentInputs& present) {
-  const boost::shared_ptr<const AnalysisResult> stored = state.result;
-  if (stored->all_features.frame_count <= 0) return false;
-  if (IdentifierWithoutPath(stored->job_input) != IdentifierWithoutPath(present.job_input())) {
-    return false;
-  }
-  if (!stored->tracker_identity.IsNil() && present.tracker_identity() != stored->tracker_identity) {
-    return false;
-  }
-  if (stored->source_identity.IsNil()) return false;
+bool FitsSource(AnalysisState& state, const PresentInputs& present) {
+  const Guid stored = state.result->source_identity;
   const Guid first = present.source_identity();
-  if (first == stored->source_identity) return true;
-  if (present.source_identity() != stored->source_identity) return false;
+  if (first == stored) return true;
+  if (present.source_identity() != stored) return false;
   Replace(state.result, [&first](AnalysisResult& next) { next.source_identity = first; });
   return true;
+}
+
+Validity Compared(AnalysisState& state, const PresentInputs& present) {
+  const boost::shared_ptr<const AnalysisResult> stored = state.result;
+  if (stored->all_features.frame_count <= 0) return Validity::Stale;
+  const bool same_span =
+      IdentifierWithoutPath(stored->job_input) == IdentifierWithoutPath(present.job_input());
+  const bool same_tracker =
+      stored->tracker_identity.IsNil() || present.tracker_identity() == stored->tracker_identity;
+  if (stored->source_identity.IsNil()) return Validity::Stale;
+  if (!FitsSource(state, present)) return Validity::OtherSource;
+  return same_span && same_tracker ? Validity::Current : Validity::Stale;
 }
 
 bool SpanLiesWithin(const JobInput& inner, const JobInput& outer) {
@@ -38,12 +42,12 @@ bool SpanLiesWithin(const JobInput& inner, const JobInput& outer) {
 
 }  // namespace
 
-bool IsAnalysisCurrent(AnalysisState& state, const PresentInputs& present, HX_OutData* host_out) {
+Validity GetValidity(AnalysisState& state, const PresentInputs& present, HX_OutData* host_out) {
   try {
-    return FitsInputs(state, present);
+    return Compared(state, present);
   } catch (...) {
     effect::ClearMessage(effect::RecordsOnly(nullptr, host_out));
-    return false;
+    return Validity::Unknown;
   }
 }
 
@@ -57,7 +61,7 @@ FrameStatus GetAnalysisStatus(const AnalysisState& state, std::int64_t frame,
     return FrameStatus::OutsideRange;
   }
   const JobInput& stored = state.result->job_input;
-  if (stored.FieldType != -1 && SpanLiesWithin(*present, stored) &&
+  if (!state.source_changed && stored.FieldType != -1 && SpanLiesWithin(*present, stored) &&
       IdenticalTimes(present->StepTime, stored.StepTime) &&
       present->FieldType == stored.FieldType) {
     return FrameStatus::Ready;

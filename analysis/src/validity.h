@@ -14,10 +14,18 @@ struct PresentInputs {
   boost::function<tessel::utility::Guid()> source_identity;
 };
 
-// Whether the stored result is what an analysis would give now. Asks no more than it needs to know,
-// the host's graph last. Does not throw: what can't be learnt makes the result stale, and no
-// message about it stays in `host_out`. May store a source identity that changed back meanwhile.
-bool IsAnalysisCurrent(AnalysisState& state, const PresentInputs& present, HX_OutData* host_out);
+// What the stored result is to one that an analysis would give now.
+enum class Validity {
+  Current,  // the same
+  Stale,    // of another span or of other parameters, of a source that is not known, or no result
+  OtherSource,  // of another source than stands under the effect now, whatever else has changed
+  Unknown       // the host can't tell
+};
+
+// Asks nothing where there is no result, and the host's graph last. Does not throw, and no message
+// about what can't be learnt stays in `host_out`. May store a source identity that changed back
+// meanwhile.
+Validity GetValidity(AnalysisState& state, const PresentInputs& present, HX_OutData* host_out);
 
 // Status of a frame as far as the analysis knows it. The values are shared by the whole effect.
 enum class FrameStatus : std::int32_t {

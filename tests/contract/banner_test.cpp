@@ -168,6 +168,15 @@ TEST_F(Banner, WhatWantsTheUsersAnalyzeIsFlat) {
       EXPECT_EQ(Difference(*beneath(2), *SourceFrame(effect, 2)), 0);
     }
   }
+  const SourcePtr analysed = layer->state()->source;
+  for (const bool other : {true, false}) {
+    layer->ReplaceMedia(other ? MakeShakyClip({320, 240, 26, "other footage"}) : analysed);
+    session().Tick();
+    EXPECT_EQ(Enabled(effect, kAnalyze), other);
+    EXPECT_EQ(Session::StatusOf(effect), other ? 3 : kReady);
+    EXPECT_EQ(exports().allow_cuda_rendering(effect.opaque_data()), !other);
+    ExpectBanner(effect, other ? std::optional(Look{kBlue, false, true}) : std::nullopt);
+  }
 }
 
 TEST_F(Banner, FailuresAreRed) {

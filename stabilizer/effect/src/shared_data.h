@@ -28,6 +28,7 @@ struct StabilizerSharedData {
     bool needs_solve;
     bool first_analysis;
     bool subsequent_solve;
+    bool source_changed;
     bool gpu_allowed;  // outside renderers may draw the frames
   } contents{};
 };

@@ -57,7 +57,8 @@ void SolveService::CheckParams() {
   const SourceShape present = ShapeOf(*context_.in);
   if (!present.SameSize(state_.source)) {
     ReportSizeMismatch();
-    state_.needs_solve = false;
+    // A host that was told of a solve to come would wait for it.
+    if (std::exchange(state_.needs_solve, false)) effect_.PublishStatus(state_.SettledStatus());
     return;
   }
   // The tracks are in the source's pixels, whatever their aspect is said to be.
@@ -103,8 +104,7 @@ void SolveService::Finish() {
     effect_.ReportOutOfMemory();
   }
   state_.TakeSolve();
-  const FrameStatus status =
-      state_.phase == SolvePhase::Solved ? FrameStatus::Ready : FrameStatus::SolveFailed;
+  const FrameStatus status = state_.SettledStatus();
   state_.unpublished = status;  // whoever waits for the results must learn of them, come what may
   const bool first = std::exchange(state_.first_analysis, false);
   effect_.RefreshParams();

@@ -243,6 +243,8 @@ bool StabilizerEffect::ServiceAnalysis(bool from_render) {
     PublishSharedData();
     return false;
   }
+  const analysis::Validity validity = GetValidity(*state);
+  NoteSource(validity);  // what a solve that has ended tells depends on it
   SolveService solve(*this, *state);
   if (state->solver) {
     const Solver::State status = state->solver->GetState();
@@ -259,11 +261,21 @@ bool StabilizerEffect::ServiceAnalysis(bool from_render) {
     return true;
   }
   if (context().params) {
-    UpdateStartStopButtonEnablement(!IsAnalysisCurrent(state), false, nullptr);
+    UpdateStartStopButtonEnablement(validity != analysis::Validity::Current, false, nullptr);
     if (state->solver) solve.ShowProgress();
   }
   PublishSharedData();
   return true;
+}
+
+// A solve that is to come tells it at its end.
+void StabilizerEffect::NoteSource(analysis::Validity validity) {
+  StabilizerState& state = *GetState();
+  const bool changed = validity == analysis::Validity::OtherSource;
+  if (validity == analysis::Validity::Unknown || changed == state.source_changed) return;
+  state.source_changed = changed;
+  if (!state.needs_solve) PublishStatus(state.SettledStatus());
+  ForceRerender(context());
 }
 
 void StabilizerEffect::RefreshParams() {

@@ -65,6 +65,10 @@ class StabilizerEffect final : public analysis::effect::AnalysisEffect {
 
   // An instance out of a flattened handle, or a render's empty copy out of none.
   virtual void ReloadInstance();
+
+ private:
+  // Whether the source is still the analysed one, for frames and host.
+  void NoteSource(analysis::Validity validity);
 };
 
 }  // namespace kelp::effect

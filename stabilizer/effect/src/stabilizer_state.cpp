@@ -53,6 +53,12 @@ FrameStatus StabilizerState::SolveProgressStatus() const {
   return first_analysis ? FrameStatus::SolveInProgress : FrameStatus::SubsequentSolve;
 }
 
+FrameStatus StabilizerState::SettledStatus() const {
+  if (!has_frames()) return FrameStatus::PressAnalyze;
+  if (phase == SolvePhase::Failed) return FrameStatus::SolveFailed;
+  return source_changed ? FrameStatus::RangeChanged : FrameStatus::Ready;
+}
+
 bool StabilizerState::IsAtWorkOn(const Solver::Inputs& inputs) const {
   if (!solver) return false;
   const Solver::Inputs& present = solver->inputs();
@@ -179,6 +185,7 @@ void StabilizerState::Publish(bool gpu_allowed) const {
                                           .needs_solve = needs_solve,
                                           .first_analysis = first_analysis,
                                           .subsequent_solve = subsequent_solve,
+                                          .source_changed = source_changed,
                                           .gpu_allowed = gpu_allowed};
   {
     const std::unique_lock<std::shared_mutex> lock(shared->lock);
@@ -206,6 +213,7 @@ void StabilizerState::TakeOver() {
   needs_solve = contents.needs_solve;
   first_analysis = contents.first_analysis;
   subsequent_solve = contents.subsequent_solve;
+  source_changed = contents.source_changed;
 }
 
 SavedState StabilizerState::Save() const {

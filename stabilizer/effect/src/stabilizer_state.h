@@ -45,6 +45,8 @@ class StabilizerState final : public analysis::AnalysisState {
   std::optional<Solver::State> SolveStatus() const;
   // What frames show until the solve is done.
   analysis::FrameStatus SolveProgressStatus() const;
+  // What the host is told once nothing is under way.
+  analysis::FrameStatus SettledStatus() const;
 
   // Starts a Solver on the stored analysis, unless one is at work on just that or waits for its
   // thread; whether it did. One at work on other inputs is dropped. Where the stored warps fit,

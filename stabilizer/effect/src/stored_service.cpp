@@ -127,9 +127,7 @@ std::unique_ptr<StabilizerState> StateOfFlattened(const HostContext& context,
 
 FrameStatus UntoldStatus(const StabilizerState& state, double counter) {
   if (state.analyzer || (state.has_frames() && state.needs_solve)) return FrameStatus::None;
-  const FrameStatus status = !state.has_frames()                 ? FrameStatus::PressAnalyze
-                             : state.phase == SolvePhase::Failed ? FrameStatus::SolveFailed
-                                                                 : FrameStatus::Ready;
+  const FrameStatus status = state.SettledStatus();
   const auto told = static_cast<FrameStatus>(std::llround(std::fmod(counter, 100)));
   const bool idle = status == FrameStatus::PressAnalyze && told == FrameStatus::None;
   return told == status || idle ? FrameStatus::None : status;

@@ -34,12 +34,13 @@ class ValidityTest : public calmframe::host::HostRecords {
     Replace(state_.result, change);
   }
   JobInput Input() { return ReadJobInput(&in_, &out_); }
-  bool Current() {
+  Validity Found() {
     const PresentInputs present = {[this] { return Input(); },
                                    [this] { return GetIdentifierForTracker(selector_, {}); },
                                    [this] { return GetUpstreamIdentifier(&in_, &out_); }};
-    return IsAnalysisCurrent(state_, present, &out_);
+    return GetValidity(state_, present, &out_);
   }
+  bool Current() { return Found() == Validity::Current; }
   int Status(std::int64_t frame) {
     const JobInput input = Input();
     return static_cast<int>(GetAnalysisStatus(state_, frame, &input));
@@ -67,7 +68,10 @@ TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
     EXPECT_TRUE(Current());
   }
   selector_.spacing = 11;
-  EXPECT_FALSE(Current());
+  EXPECT_EQ(Found(), Validity::Stale);
+  layer().ReplaceMedia(calmframe::host::MakeShakyClip(calmframe::host::SmallClip("another")));
+  EXPECT_EQ(Found(), Validity::OtherSource) << "whatever else has changed";
+  layer().Change([&](LayerState& l) { l = before; });
   Stored([](AnalysisResult& result) { result.tracker_identity = {}; });  // of an old project
   EXPECT_TRUE(Current());
   media().faults.node_missing = true;  // a source that can't be told is like no other
@@ -75,7 +79,7 @@ TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
   EXPECT_FALSE(Current());
   Stored([](AnalysisResult& result) { result.all_features.frame_count = 0; });
   const auto asked = Operations::Get().count();
-  EXPECT_FALSE(IsAnalysisCurrent(state_, {[this] { return Input(); }, {}, {}}, &out_));
+  EXPECT_EQ(GetValidity(state_, {[this] { return Input(); }, {}, {}}, &out_), Validity::Stale);
   EXPECT_EQ(Operations::Get().count(), asked) << "nothing is asked for it";
 }
 
@@ -85,11 +89,11 @@ TEST_F(ValidityTest, ASourceThatChangedBackWhileAskedStaysCurrent) {
   PresentInputs present = {[this] { return state_.result->job_input; },
                            [this] { return state_.result->tracker_identity; },
                            [&] { return ++asked == 1 ? other : stored; }};
-  EXPECT_TRUE(IsAnalysisCurrent(state_, present, &out_));
+  EXPECT_EQ(GetValidity(state_, present, &out_), Validity::Current);
   EXPECT_EQ(state_.result->source_identity, other);
   asked = 0;
   present.source_identity = [&] { return ++asked, Guid::MakeUnique(); };
-  EXPECT_FALSE(IsAnalysisCurrent(state_, present, &out_));
+  EXPECT_EQ(GetValidity(state_, present, &out_), Validity::OtherSource);
   EXPECT_EQ(asked, 2);
   EXPECT_EQ(state_.result->source_identity, other);
 }
@@ -99,7 +103,7 @@ TEST_F(ValidityTest, WhatCannotBeLearntIsStaleWithoutAMessage) {
        {"Utility.GetStartFrame", "Video Segment.GetNodeGuid", "acquire Analysis Host Suite",
         "acquire Rushbase Sequence Info Suite"}) {
     Operations::Get().FailNth(1, operation);
-    EXPECT_FALSE(Current()) << operation;
+    EXPECT_EQ(Found(), Validity::Unknown) << operation;
     EXPECT_EQ(TakeMessage(), "");
   }
   hosted_.Refuse("The layer is a still.");
@@ -127,6 +131,11 @@ TEST_F(ValidityTest, StatusOfAFrame) {
     });
     EXPECT_EQ(Status(frame), status) << start << " " << count << " " << frame;
   }
+  layer().Change([](LayerState& layer) { layer.ticks_per_frame = 28224000; });
+  EXPECT_EQ(Status(14), 8);
+  state_.source_changed = true;
+  EXPECT_EQ(Status(14), 3);
+  state_.source_changed = false;
   Stored([](AnalysisResult& result) { result.job_input.FieldType = -1; });
   EXPECT_EQ(Status(14), 3);
   Stored([](AnalysisResult& result) { result.all_features.frame_count = 0; });
