@@ -166,7 +166,8 @@ static HX_Err CheckoutParam(HX_EffectRef effect, int32_t index, int32_t time, in
   *param = effect->params[index];
   if (index > 0) return HX_ERR_NONE;
   const int64_t frame = (int64_t)time * kRate / (int64_t)time_scale;
-  if (frame < 0 || frame >= kFrames) return HX_ERR_UNKNOWN;
+  param->u.ld.data = NULL;
+  if (frame < 0 || frame >= kFrames) return HX_ERR_NONE;
   HX_Pixel8* pixels = FramePixels((int)frame);
   if (!pixels) return HX_ERR_MEMORY;
   SetWorld(&param->u.ld, pixels, kWidth, kHeight);

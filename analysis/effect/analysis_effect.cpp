@@ -262,7 +262,8 @@ CurrentFrame AnalysisEffect::GetCurrentFrame(bool clamped) try {
   const marrow::tracking::AllFeatures& table = state->table();
   const std::int64_t last =
       table.frame_count + std::max<std::int64_t>({start, table.first_frame, 0}) - 1;
-  return {true, std::clamp<std::int64_t>(frame, 0, last)};
+  const std::int64_t shown = std::clamp<std::int64_t>(frame, 0, last);
+  return {true, shown, shown != frame || time != in.current_time};
 } catch (...) {
   kelp::effect::ClearMessage(context());
   return {};

@@ -28,6 +28,7 @@ struct StatusRecord {
 struct CurrentFrame {
   bool valid = false;
   std::int64_t frame = 0;
+  bool limited = false;  // stands in for one outside of the layer or of what was analysed
 };
 
 // An effect that needs a long background analysis of its input before it can render: the Analyze

@@ -18,10 +18,12 @@ HX_Err CheckoutInput(Instance& instance, std::int32_t time, std::uint32_t time_s
                      HX_ParamDef& param) {
   if (!instance.frames() || time_scale == 0) return HX_ERR_UNKNOWN;
   const LayerTime layer(instance.frames()->layer());
-  const HX_World* world = instance.frames()->CheckOutInput(layer.MediaTicks(time, time_scale));
-  if (!world) return HX_ERR_UNKNOWN;
+  const std::int64_t ticks = layer.MediaTicks(time, time_scale);
   param = {};
   param.kind = HX_PARAM_LAYER;
+  if (!instance.frames()->HasFrame(ticks)) return HX_ERR_NONE;
+  const HX_World* world = instance.frames()->CheckOutInput(ticks);
+  if (!world) return HX_ERR_UNKNOWN;
   param.u.ld = *world;
   return HX_ERR_NONE;
 }
@@ -45,7 +47,7 @@ HX_Err CheckinParam(HX_EffectRef effect, HX_ParamDef* param) {
   Host* host = Host::active();
   if (!host) return HX_ERR_UNKNOWN;
   host->CountParamCheckout(-1);
-  if (param->kind != HX_PARAM_LAYER) return HX_ERR_NONE;
+  if (param->kind != HX_PARAM_LAYER || !param->u.ld.data) return HX_ERR_NONE;
   const std::shared_ptr<Instance> instance = host->instances().Find(effect);
   if (!instance || !instance->frames()) return HX_ERR_UNKNOWN;
   instance->frames()->CheckInInput(param->u.ld.data);

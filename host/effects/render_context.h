@@ -40,8 +40,10 @@ class RenderContext {
   int width() const { return width_; }  // of the layer at this scale, rounded up
   int height() const { return height_; }
 
+  // Whether the media has one at a time; it may not be readable.
+  bool HasFrame(std::int64_t media_ticks) const;
   // The layer's frame at a media time, held, as is its record, until it is checked in. Null when
-  // there is none.
+  // there is none, or it can't be read.
   const HX_World* CheckOutInput(std::int64_t media_ticks);
   void CheckInInput(const void* pixels);
 
@@ -68,7 +70,6 @@ class RenderContext {
   };
 
   PicturePtr Fetch(std::int64_t media_ticks);
-  bool HasFrame(std::int64_t media_ticks) const;
 
   MediaServices& media_;
   const HX_EffectRef effect_;

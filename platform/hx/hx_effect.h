@@ -55,7 +55,8 @@ typedef struct HX_StringTable {
 
 typedef struct HX_Callbacks {
   /* UI, render. A copy of a parameter at a time; index 0 gives the layer's frame, valid until the
-     checkin that follows every checkout. An index that was not declared is an error. */
+     checkin that follows every checkout; its data is null, with success, where the media has no
+     frame. An index that was not declared is an error. */
   HX_Err (*checkout_param)(HX_EffectRef effect, int32_t index, int32_t time, int32_t time_step,
                            uint32_t time_scale, HX_ParamDef* param);
   HX_Err (*checkin_param)(HX_EffectRef effect, HX_ParamDef* param);

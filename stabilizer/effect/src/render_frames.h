@@ -27,7 +27,7 @@ using marrow::render::WorldX;
 class RenderFrames {
  public:
   virtual ~RenderFrames() = default;
-  // The layer's frame at the render's own time.
+  // The layer's frame at the render's own time; without data where the media has none.
   virtual boost::shared_ptr<HX_World> Input() = 0;
   // The frame of an absolute index of the analysis.
   virtual boost::shared_ptr<HX_World> Frame(std::int64_t frame) = 0;

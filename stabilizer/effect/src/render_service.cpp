@@ -55,6 +55,14 @@ HX_Rect MovedIntoWorld(const HX_Rect& rect, const HX_World& world) {
           rect.bottom - world.origin_y};
 }
 
+// What is ordered under it is asked for, and not fetched.
+constexpr std::int32_t kProbeId = -1;
+
+bool HasPixels(const HX_CheckoutResult& ordered) {
+  const HX_Rect& all = ordered.full_rect;
+  return all.right > all.left && all.bottom > all.top;
+}
+
 template <class Visit>
 void ForDepth(std::int32_t depth, const Visit& visit) {
   switch (depth) {
@@ -169,9 +177,15 @@ void RenderService::Plan(HX_PlanExtra& plan) {
       const HostTime at = clock.At(frame);
       ThrowIfFailed(plan.checkout_layer(in.effect_ref, 0, static_cast<std::int32_t>(frame), &whole,
                                         at.time, at.step, at.scale, &input));
+      if (frame == current.frame) state.planned_media = HasPixels(input);
     }
   } else {
     order_input(state.planned_input, whole);
+    state.planned_media = HasPixels(input);
+  }
+  if (state.planned_warp && current.limited) {
+    order_input(kProbeId, whole);
+    state.planned_media = HasPixels(input);
   }
 
   const OutputRect output = SetUpOutput();
@@ -191,6 +205,7 @@ void RenderService::RenderPlanned(const HX_RenderExtra& extra) {
   HX_World* output = nullptr;
   ThrowIfFailed(extra.checkout_output(context_.in->effect_ref, &output));
   const StabilizerState* const state = effect_.GetState();
+  if (state && !effect_.IsOneByOne() && !state->planned_media) return ClearWorld(*output, depth);
   PlannedFrames frames(context_, state && !effect_.IsOneByOne() ? state->planned_input : 0);
   Render(frames, *output, depth, state && state->planned_warp);
 }
@@ -200,7 +215,10 @@ void RenderService::RenderPlanned(const HX_RenderExtra& extra) {
 void RenderService::RenderDirect(HX_World& output) {
   const DirectRender render(context_);
   DirectFrames frames(context_, [this] { return ClockOf(*effect_.GetState()); });
-  Render(frames, output, output.flags & HX_WORLD_DEEP ? 16 : 8, true);
+  const std::int32_t depth = output.flags & HX_WORLD_DEEP ? 16 : 8;
+  const boost::shared_ptr<HX_World> input = frames.Input();
+  if (!input->data) return ClearWorld(output, depth);
+  Render(frames, output, depth, true);
 }
 
 // -- What both draw --

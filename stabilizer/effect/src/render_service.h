@@ -25,7 +25,8 @@ class RenderService {
   // and may reach beyond it.
   OutputRect SetUpOutput();
   // Orders the frames that RenderPlanned draws from, and answers for the output. A state and its
-  // block that are not there yet are made first.
+  // block that are not there yet are made first. Where the media has no frame for the layer's, both
+  // paths leave the output clear, without a banner.
   void Plan(HX_PlanExtra& plan);
   void RenderPlanned(const HX_RenderExtra& extra);
   void RenderDirect(HX_World& output);

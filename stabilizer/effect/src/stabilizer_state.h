@@ -98,10 +98,12 @@ class StabilizerState final : public analysis::AnalysisState {
   StabilizerSharedData* shared = nullptr;  // attached to; see StabilizerEffect::AttachSharedData
   // What the host still has to be told, where telling it has failed.
   analysis::FrameStatus unpublished = analysis::FrameStatus::None;
-  // Of a render's copy: under which id its plan ordered the frame of its own time, and whether it
-  // ordered frames for the warp. The render keeps to it, whatever the host answers meanwhile.
+  // Of a render's copy: under which id its plan ordered the frame of its own time, whether it
+  // ordered frames for the warp, and whether the media has a frame at that time. The render keeps
+  // to it, whatever the host answers meanwhile.
   std::int32_t planned_input = 0;
   bool planned_warp = false;
+  bool planned_media = true;
   // The source about which the user was told last that the state is of another.
   SourceShape reported_source;
 

@@ -110,7 +110,7 @@ class FrameProbe : public ProbeTest {
       HX_Err code = call.cb().checkout_param(call.ref(), 0, in.current_time + offset * in.time_step,
                                              in.time_step, in.time_scale, &input);
       if (code != HX_ERR_NONE) return code;
-      code = Draw(call, input.u.ld, call.output);
+      code = input.u.ld.data ? Draw(call, input.u.ld, call.output) : HX_Err{HX_ERR_UNKNOWN};
       call.cb().checkin_param(call.ref(), &input);
       return code;
     };

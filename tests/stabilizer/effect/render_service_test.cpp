@@ -12,6 +12,16 @@ using Rect = std::vector<int>;
 // 73 x 53 whose surplus of 9 x 5 puts the layer at trunc(4.5), trunc(2.5) = (4, 2) of the output.
 const std::vector<marrow::stabilization::point2> kTwoFrames = {{0, 0}, {10, 6}};
 
+bool IsClear(const WorldBuffer& pixels) {
+  const HX_Rect rect = pixels.rect();
+  for (int y = rect.top; y < rect.bottom; ++y) {
+    for (int x = rect.left; x < rect.right; ++x) {
+      if (ChannelAt(pixels, x, y, 0) != 0) return false;
+    }
+  }
+  return true;
+}
+
 TEST_F(RenderServiceTest, SizesAndRectanglesOfBothPaths) {
   Solve(kTwoFrames, {{kFraming, 3}});
   const auto expect = [&](const RenderRequest& request, const Rect& full, const Rect& drawn) {
@@ -124,10 +134,23 @@ TEST_F(RenderServiceTest, FeatherAndCropsFollowTheScaleAndTheBoostIsItsDefault) 
 
 TEST_F(RenderServiceTest, NoSizeLeavesTheOutputClear) {
   Solve(kTwoFrames, {{kFraming, 1}, {kAdditionalScale, 0}});
-  const auto clear = DrawBoth(Whole(0));
-  const HX_Rect rect = clear->rect();
-  for (int x = rect.left; x < rect.right; ++x) EXPECT_EQ(ChannelAt(*clear, x, 20, 0), 0);
+  EXPECT_TRUE(IsClear(*DrawBoth(Whole(0))));
   EXPECT_TRUE(hosted().effect().shared()->PolygonOf(0).empty());
+}
+
+// Also where a banner would be, and where the nearest frame stands in.
+TEST_F(RenderServiceTest, WhatTheMediaHasNoFrameForIsClear) {
+  Solve(kTwoFrames, {{kFraming, 1}});
+  hosted().Place(-1, 4);
+  for (const char* refusal : {"", "No."}) {
+    hosted().Refuse(refusal);
+    for (const int frame : {0, 1, 2, 3}) {
+      for (const int depth : {8, 16, 32}) {
+        EXPECT_EQ(IsClear(*DrawBoth(Whole(frame, depth))), frame % 3 == 0) << refusal << frame;
+      }
+    }
+  }
+  hosted().Refuse("");
 }
 
 // What fails anywhere, and is given back then, is asked of the plug-in in tests/contract.
