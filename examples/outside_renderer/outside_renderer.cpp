@@ -1,12 +1,12 @@
 // A renderer outside of the plug-in, on a thread of its own, beside the plug-in's own renders.
 //
-//   outside_renderer CLIP OUTPUT_DIR [--frames N] [--software]
+//   outside_renderer CLIP OUTPUT_DIR [--start N] [--frames N] [--software]
 //
-// has the host library analyse and solve the clip; draws its first N frames (30) once by the
-// plug-in and once by drawing/, which knows the plug-in's exports and no more; tells how far they
-// are apart and how fast each was; and leaves a frame of both beside each other, framing_N.ppm for
-// each value of Framing. It draws with OpenGL where there is one, in plain C++ elsewhere and with
-// --software.
+// has the host library analyse and solve the clip, on a layer that leaves out as many frames as
+// --start says (none); draws the layer's first N frames (30) once by the plug-in and once by
+// drawing/, which knows the plug-in's exports and no more; tells how far they are apart and how
+// fast each was; and leaves a frame of both beside each other, framing_N.ppm for each value of
+// Framing. It draws with OpenGL where there is one, in plain C++ elsewhere and with --software.
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
@@ -33,7 +33,7 @@ using outside::Picture;
 
 struct Options {
   std::string clip, output_dir;
-  std::int32_t frames = 30;
+  std::int32_t start = 0, frames = 30;
   bool software = false;
 };
 
@@ -70,16 +70,16 @@ std::unique_ptr<outside::FrameDrawer> MakeDrawer(bool software) {
   return outside::MakePlainDrawer();
 }
 
-// On a thread of its own. It is given the block's address, the source's frames and what the
-// controls say; everything else comes from the exports.
+// On a thread of its own. It is given the block's address, the layer's frames, where they begin in
+// the source and what the controls say; everything else comes from the exports.
 Drawn DrawOutside(const outside::Exports& exports, const void* block,
                   const outside::Controls& controls, const std::vector<host::PicturePtr>& sources,
-                  bool software) {
+                  std::int32_t start_frame, bool software) {
   const auto drawer = MakeDrawer(software);
   Drawn drawn{drawer->name(), std::vector<Picture>(sources.size()), 0};
   const auto draw = [&](std::int32_t frame) {
     outside::SolvedFrame solved;
-    if (!outside::ReadFrame(exports, block, frame, solved)) {
+    if (!outside::ReadFrame(exports, block, frame, start_frame, solved)) {
       throw std::runtime_error("the plug-in lets nobody draw frame " + std::to_string(frame));
     }
     const host::Picture& source = *sources[static_cast<std::size_t>(frame)];
@@ -120,11 +120,19 @@ class Comparing {
     }
     controls_.pixel_aspect_num = info.pixel_aspect.num;
     controls_.pixel_aspect_den = static_cast<std::int32_t>(info.pixel_aspect.den);
-    const auto frames = std::min<std::int64_t>(options.frames, info.frame_count);
-    for (std::int64_t frame = 0; frame < frames; ++frame) {
-      sources_.push_back(clip->Fetch(frame, host::PixelKind::argb8));
+    if (options.start >= info.frame_count) {
+      throw std::runtime_error(options.clip + ": has no frame " + std::to_string(options.start));
     }
-    effect_ = &session_.Apply(boost::make_shared<host::Layer>(clip));
+    layer_ = boost::make_shared<host::Layer>(clip);
+    layer_->Change([&](host::LayerState& state) {
+      state.start_frame = options.start;
+      state.length -= options.start;
+    });
+    const std::int32_t frames = std::min(options.frames, layer_->state()->length);
+    for (std::int32_t frame = 0; frame < frames; ++frame) {
+      sources_.push_back(clip->Fetch(options.start + frame, host::PixelKind::argb8));
+    }
+    effect_ = &session_.Apply(layer_);
     if (!effect_->creation().ok()) throw std::runtime_error(effect_->creation().Line(options.clip));
   }
 
@@ -141,9 +149,9 @@ class Comparing {
       const Drawn theirs = DrawByPlugin(*effect_, static_cast<std::int32_t>(sources_.size()));
 
       // The block stays while the effect does, which goes on ticking.
-      auto drawing =
-          std::async(std::launch::async, DrawOutside, std::cref(exports), effect_->opaque_data(),
-                     controls_, std::cref(sources_), options_.software);
+      auto drawing = std::async(std::launch::async, DrawOutside, std::cref(exports),
+                                effect_->opaque_data(), controls_, std::cref(sources_),
+                                layer_->state()->start_frame, options_.software);
       while (drawing.wait_for(std::chrono::milliseconds(50)) != std::future_status::ready) {
         session_.Tick();
       }
@@ -188,6 +196,7 @@ class Comparing {
   const Options options_;
   host::Host host_;
   host::Session session_;
+  boost::shared_ptr<host::Layer> layer_;
   host::Effect* effect_ = nullptr;
   std::vector<host::PicturePtr> sources_;
   outside::Controls controls_;
@@ -200,6 +209,7 @@ int main(int argc, char** argv) {
   Options options;
   program.add_option("CLIP", options.clip)->required();
   program.add_option("OUTPUT_DIR", options.output_dir)->required();
+  program.add_option("--start", options.start)->check(CLI::Range(0, 1000000));
   program.add_option("--frames", options.frames)->check(CLI::Range(1, 1000));
   program.add_flag("--software", options.software);
   CLI11_PARSE(program, argc, argv);

@@ -20,7 +20,8 @@ typedef struct HX_VarVector {
 /* Whether what is solved fits the controls, and drawing by it alone gives the effect's picture. */
 typedef uint8_t (*HX_AllowCUDARendering)(const void* block);
 /* The frame's warp, to be rendered from at once; null without one. Frames (fields, where the layer
- * is interlaced) are counted from the first analysed one; one outside the warps throws. The address
+ * is interlaced) are counted from the first analysed one: the layer's frame + the layer's in-point
+ * in source frames - first_frame (HX_GetStabilizerData). One outside the warps throws. The address
  * holds until the same thread asks again or ends, whatever is solved meanwhile; asking with a null
  * block lets go of it. A thread that has asked once keeps the library from being unloaded until it
  * ends. */
@@ -31,7 +32,7 @@ typedef const HX_VarVector* (*HX_GetOVVarVector)(const void* block, int32_t fram
 typedef void (*HX_GetCropWindow)(const void* block, int32_t frame, float* left, float* top,
                                  float* right, float* bottom);
 /* False without a solve; then the outs stand unchanged. The crop's size stands unchanged without a
- * crop. first_frame: where the first analysed one stands on the layer. min_x to max_y: what all
+ * crop. first_frame: the first analysed one, counted in the source. min_x to max_y: what all
  * frames' warps cover together. The source's size is in the layer's own pixels. */
 typedef uint8_t (*HX_GetStabilizerData)(const void* block, int32_t* frame_count,
                                         int32_t* first_frame, int32_t* grid_columns,

@@ -22,7 +22,7 @@ class OutsideRendererProgram : public testing::Test, protected ScratchFolder {
     calmframe::WriteStreet(In("clip.mkv"), calmframe::Made(240, 136, 24, 25, {4, 3}), 3);
     const calmframe::Outcome outcome =
         calmframe::Shell("ASAN_OPTIONS=detect_leaks=0 " CALMFRAME_OUTSIDE_RENDERER " '" +
-                         In("clip.mkv") + "' '" + In("") + "' --frames 12 " + flags);
+                         In("clip.mkv") + "' '" + In("") + "' --start 5 --frames 12 " + flags);
     EXPECT_EQ(outcome.code, 0) << outcome.text;
     return outcome.text;
   }
@@ -74,7 +74,10 @@ class OutsideRenderer : public PlayedPlugin {};
 TEST_F(OutsideRenderer, FollowsTheControls) {
   ShakyClip clip;
   clip.tremor = 2;
-  Effect& effect = session().Apply(MakeLayer(clip));
+  constexpr std::int32_t kStart = 4, kEnd = 24;
+  const auto layer = MakeLayer(clip);
+  Trim(*layer, kStart, kEnd - kStart);
+  Effect& effect = session().Apply(layer);
   ASSERT_EQ(Settle(effect), 8);
   const outside::Exports exports(host().library().path());
   const auto drawer = outside::MakePlainDrawer();
@@ -98,10 +101,15 @@ TEST_F(OutsideRenderer, FollowsTheControls) {
     effect.SetParam(kMaximumScale, controls.maximum_scale * 100);
     effect.SetParam(kAdditionalScale, controls.additional_scale * 100);
     ASSERT_EQ(Settle(effect), 8);
-    for (const std::int32_t frame : {0, 7, 23}) {
+    // Trimmed before the analysis, and some more after it.
+    const struct {
+      std::int32_t start, frame;
+    } shown[] = {{kStart, 0}, {kStart, 7}, {kStart, 19}, {9, 0}, {9, 14}};
+    for (const auto& [start, frame] : shown) {
+      Trim(*layer, start, kEnd - start);
       outside::SolvedFrame solved;
-      ASSERT_TRUE(outside::ReadFrame(exports, effect.opaque_data(), frame, solved)) << frame;
-      const auto source = SourceFrame(effect, frame);
+      ASSERT_TRUE(outside::ReadFrame(exports, effect.opaque_data(), frame, start, solved)) << frame;
+      const auto source = SourceFrame(effect, start + frame);
       const HX_World& world = source->world();
       outside::Picture ours;
       drawer->Draw(outside::MeshOf(solved, controls),
@@ -116,11 +124,11 @@ TEST_F(OutsideRenderer, FollowsTheControls) {
   }
   // Where the plug-in has edges to make up, and where there is no frame, nobody else draws.
   outside::SolvedFrame solved;
-  EXPECT_FALSE(outside::ReadFrame(exports, effect.opaque_data(), 24, solved));
+  EXPECT_FALSE(outside::ReadFrame(exports, effect.opaque_data(), 15, 9, solved));
   effect.SetParam(kFraming, 4);
   ASSERT_EQ(Settle(effect), 8);
-  EXPECT_FALSE(outside::ReadFrame(exports, effect.opaque_data(), 7, solved));
-  EXPECT_FALSE(outside::ReadFrame(exports, nullptr, 7, solved));
+  EXPECT_FALSE(outside::ReadFrame(exports, effect.opaque_data(), 7, 9, solved));
+  EXPECT_FALSE(outside::ReadFrame(exports, nullptr, 7, 9, solved));
 }
 
 // Pixels of no alpha leave no colour, and half-clear ones count by half.

@@ -45,10 +45,10 @@ Exports::Exports(const std::string& plugin)
 // Each export has the lock for itself alone, so a solve may come between two of them. Then what
 // they tell does not belong together, and the effect has asked for a render anew.
 bool ReadFrame(const Exports& exports, const void* block, std::int32_t layer_frame,
-               SolvedFrame& frame) {
+               std::int32_t start_frame, SolvedFrame& frame) {
   frame = {};
   if (!exports.allow_rendering(block) || !ReadData(exports, block, frame)) return false;
-  const std::int32_t row = layer_frame - frame.first_frame;
+  const std::int32_t row = layer_frame + start_frame - frame.first_frame;
   if (row < 0 || row >= frame.frame_count) return false;
   frame.warp = exports.get_warp(block, row);
   exports.get_crop_window(block, row, &frame.left, &frame.top, &frame.right, &frame.bottom);

@@ -38,9 +38,10 @@ struct SolvedFrame {
   const HX_VarVector* warp = nullptr;              // until this thread reads its next frame
 };
 
-// The frame, counted on the layer; false where the plug-in's own picture has to be taken. The block
-// must stay during the call.
+// The frame, counted on the layer, whose in-point is the source's frame start_frame, below 0 where
+// the layer begins before its media; false where the plug-in's own picture has to be taken. The
+// block must stay during the call.
 bool ReadFrame(const Exports& exports, const void* block, std::int32_t layer_frame,
-               SolvedFrame& frame);
+               std::int32_t start_frame, SolvedFrame& frame);
 
 }  // namespace outside
