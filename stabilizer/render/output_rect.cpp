@@ -5,7 +5,7 @@ namespace marrow::render {
 using stabilization::point2;
 using stabilization::VarVector;
 
-Renderer makeRenderer(const ClipWarps& warps, float scaleX, float scaleY) {
+Renderer makeRenderer(const ClipWarps& warps, double scaleX, double scaleY) {
   return Renderer(warps.unionBounds(), warps.frameWidth(), warps.frameHeight(), warps.gridCols(),
                   warps.gridRows(), scaleX, scaleY);
 }

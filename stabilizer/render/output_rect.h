@@ -13,7 +13,7 @@
 namespace marrow::render {
 
 // The renderer of a clip at a render scale; see Renderer.
-Renderer makeRenderer(const ClipWarps& warps, float scaleX, float scaleY);
+Renderer makeRenderer(const ClipWarps& warps, double scaleX, double scaleY);
 
 // The scale at which the picture is shown: additional_scale, with a crop window times what fitZoom
 // finds; that also sets the renderer's output rectangle.

@@ -11,25 +11,32 @@ std::int32_t saturated(double value) {
   return static_cast<std::int32_t>(std::min(value, 1073741824.0));
 }
 
+// Rounded up, as the host rounds a frame's side. A scale is a quotient of sides: what its rounding
+// puts above a whole number would stretch the picture by a pixel.
+std::int32_t scaledSide(std::int32_t side, double scale) {
+  constexpr double kRounding = 1e-6;
+  return saturated(std::ceil(side * scale - kRounding));
+}
+
 }  // namespace
 
 Renderer::Renderer(const marrow::stabilization::frame_bounds& unionBounds, std::int32_t frameWidth,
                    std::int32_t frameHeight, std::int32_t gridCols, std::int32_t gridRows,
-                   float render_scale_x, float render_scale_y)
-    : boundsMinX(unionBounds.min_x * render_scale_x),
-      boundsMinY(unionBounds.min_y * render_scale_y),
-      boundsMaxX(unionBounds.max_x * render_scale_x),
-      boundsMaxY(unionBounds.max_y * render_scale_y),
-      sourceWidth(saturated(std::ceil(static_cast<float>(frameWidth) * render_scale_x))),
-      sourceHeight(saturated(std::ceil(static_cast<float>(frameHeight) * render_scale_y))),
+                   double render_scale_x, double render_scale_y)
+    : scaleX(static_cast<float>(render_scale_x)),
+      scaleY(static_cast<float>(render_scale_y)),
+      boundsMinX(unionBounds.min_x * scaleX),
+      boundsMinY(unionBounds.min_y * scaleY),
+      boundsMaxX(unionBounds.max_x * scaleX),
+      boundsMaxY(unionBounds.max_y * scaleY),
+      sourceWidth(scaledSide(frameWidth, render_scale_x)),
+      sourceHeight(scaledSide(frameHeight, render_scale_y)),
       cols(gridCols),
       rows(gridRows),
       cellWidth(static_cast<double>(sourceWidth - 1) / (cols - 1)),
       cellHeight(static_cast<double>(sourceHeight - 1) / (rows - 1)),
       planeWidth(saturated(std::ceil(boundsMaxX - boundsMinX))),
-      planeHeight(saturated(std::ceil(boundsMaxY - boundsMinY))),
-      scaleX(render_scale_x),
-      scaleY(render_scale_y) {}
+      planeHeight(saturated(std::ceil(boundsMaxY - boundsMinY))) {}
 
 float Renderer::fitZoom(std::int32_t frameWidth, std::int32_t frameHeight, std::int32_t cropWidth,
                         std::int32_t cropHeight, float actionSafe, float maxScale,

@@ -8,11 +8,12 @@
 // the render's scale. Read-only while strips run.
 class Renderer {
  public:
-  // unionBounds, frameWidth, frameHeight: of the analysed frame, whose pixels are square. scaleX:
-  // the host's horizontal downsample ratio over the pixel aspect; scaleY: the vertical ratio.
+  // unionBounds, frameWidth, frameHeight: of the analysed frame, whose pixels are square.
+  // render_scale_x: the host's horizontal downsample ratio over the pixel aspect; render_scale_y:
+  // the vertical ratio.
   Renderer(const marrow::stabilization::frame_bounds& unionBounds, std::int32_t frameWidth,
            std::int32_t frameHeight, std::int32_t gridCols, std::int32_t gridRows,
-           float render_scale_x, float render_scale_y);
+           double render_scale_x, double render_scale_y);
 
   // The scale at which a crop window of cropWidth x cropHeight is shown so that it covers the frame
   // less its margin, between 1 and maxScale, times `additional`. Sets the output rectangle. All
@@ -20,6 +21,8 @@ class Renderer {
   float fitZoom(std::int32_t frameWidth, std::int32_t frameHeight, std::int32_t cropWidth,
                 std::int32_t cropHeight, float actionSafe, float maxScale, float additional);
 
+  float scaleX;
+  float scaleY;
   double boundsMinX;  // union of all frames' outlines, scaled
   double boundsMinY;
   double boundsMaxX;
@@ -36,7 +39,5 @@ class Renderer {
   std::int32_t outRight = 0;
   std::int32_t outTop = 0;
   std::int32_t outBottom = 0;
-  float scaleX;
-  float scaleY;
   bool edgeTolerant = false;  // cells at the grid's border reach past it with a crop too
 };

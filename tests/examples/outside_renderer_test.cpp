@@ -74,6 +74,8 @@ class OutsideRenderer : public PlayedPlugin {};
 TEST_F(OutsideRenderer, FollowsTheControls) {
   ShakyClip clip;
   clip.tremor = 2;
+  clip.width = 346;  // 315 wide in square pixels
+  clip.aspect = {10, 11};
   constexpr std::int32_t kStart = 4, kEnd = 24;
   const auto layer = MakeLayer(clip);
   Trim(*layer, kStart, kEnd - kStart);
@@ -91,7 +93,9 @@ TEST_F(OutsideRenderer, FollowsTheControls) {
                {{Framing::crop, 0, 1.5f, 0.5f}, 0.1},
                {{Framing::stabilize_only, 0, 1.5f, 1.1f}, 0.5},
                {{Framing::stabilize_only, 0, 1.5f, 0.6f}, 0.2}};
-  for (const auto& [controls, least_share] : cases) {
+  for (auto [controls, least_share] : cases) {
+    controls.pixel_aspect_num = clip.aspect.num;
+    controls.pixel_aspect_den = static_cast<std::int32_t>(clip.aspect.den);
     SCOPED_TRACE(testing::Message()
                  << static_cast<int>(controls.framing) << " margin " << controls.action_safe_margin
                  << " maximum " << controls.maximum_scale << " additional "

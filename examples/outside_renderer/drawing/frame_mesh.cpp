@@ -65,12 +65,12 @@ struct Axis {
   std::int32_t shift = 0;
   double fraction = 0;
 
-  Axis(float scale, float minimum, float maximum, std::int32_t frame, std::int32_t grid)
+  Axis(float scale, float minimum, float maximum, std::int32_t source_side, std::int32_t grid)
       : render_scale(scale),
         origin(double{minimum} * scale),
         plane(Whole(std::ceil(double{maximum} * scale - origin))),
         output(plane),
-        source(Whole(std::ceil(static_cast<float>(frame) * scale))),
+        source(source_side),
         cell((source - 1.0) / (grid - 1)) {}
 
   // Puts the window's middle on the output's.
@@ -124,7 +124,7 @@ FrameMesh MeshOf(const SolvedFrame& f, const Controls& controls) {
                               (double{1} * controls.pixel_aspect_num / controls.pixel_aspect_den) +
                           0.5)));
   const auto scale_x = static_cast<float>(static_cast<double>(f.source_width) / frame_width);
-  Axis x(scale_x, f.min_x, f.max_x, frame_width, f.columns);
+  Axis x(scale_x, f.min_x, f.max_x, f.source_width, f.columns);
   Axis y(1.0f, f.min_y, f.max_y, f.source_height, f.rows);
 
   float zoom = controls.additional_scale;

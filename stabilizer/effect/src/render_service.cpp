@@ -110,11 +110,11 @@ class DirectRender {
 
 Renderer RendererOf(const HX_InData& in, const StabilizerState& state) {
   const auto& warper = state.solve_result->warper;
-  const double pixel_aspect =
-      static_cast<double>(warper->frameWidth()) / std::max(state.source.width, std::int32_t{1});
-  return marrow::render::makeRenderer(
-      CPWarperWarps(warper), static_cast<float>(ValueOfRatio(in.downsample_x) / pixel_aspect),
-      static_cast<float>(ValueOfRatio(in.downsample_y)));
+  const double to_layer =
+      std::max(state.source.width, std::int32_t{1}) / static_cast<double>(warper->frameWidth());
+  return marrow::render::makeRenderer(CPWarperWarps(warper),
+                                      ValueOfRatio(in.downsample_x) * to_layer,
+                                      ValueOfRatio(in.downsample_y));
 }
 
 OutputRect RenderService::SetUpOutput() {

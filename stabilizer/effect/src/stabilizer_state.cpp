@@ -172,7 +172,7 @@ bool StabilizerState::IsOverCropped(const ParameterReader& params) const {
   const RenderSettings settings = GetRenderSettings(params);
   if (!crops(settings.framing)) return false;
   const CPWarperWarps warps(solve_result->warper);
-  Renderer renderer = makeRenderer(warps, 1.0f, 1.0f);
+  Renderer renderer = makeRenderer(warps, 1.0, 1.0);
   return isOvercropped(warps, *solve_result->crop, settings, renderer);
 }
 

@@ -30,4 +30,20 @@ TEST(FitZoom, CoversTheFrameWithinItsLimitsElseCentresTheWindow) {
   }
 }
 
+TEST(Renderer, TheSourceIsAsLargeAsItsLayerWhateverItsPixels) {
+  const struct {
+    int square, layer, half;  // of 10:11, 16:15, 64:45, 1:1
+  } cases[] = {{315, 346, 173}, {341, 320, 160}, {1024, 720, 360}, {333, 333, 167}};
+  for (const auto& c : cases) {
+    const double scale = double(c.layer) / c.square;
+    const auto at = [&](double ratio) {
+      return Renderer({0, 0, c.square - 1.0, 99}, c.square, 100, 5, 3, ratio * scale, ratio);
+    };
+    EXPECT_EQ(at(1).sourceWidth, c.layer);
+    EXPECT_EQ(at(1).cellWidth, (c.layer - 1) / 4.0);
+    EXPECT_EQ(at(0.5).sourceWidth, c.half);
+    EXPECT_EQ(at(1 / 3.0).sourceHeight, 34);
+  }
+}
+
 }  // namespace
