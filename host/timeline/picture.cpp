@@ -25,6 +25,31 @@ float Average(float a, float b) {
   return 0.5f * (a + b);
 }
 
+// A colour counts as much as its alpha; without any there is none.
+template <class Sample>
+Sample Weighted(Sample a, Sample alpha_a, Sample b, Sample alpha_b) {
+  const std::uint64_t sum = std::uint64_t{alpha_a} + alpha_b;
+  return static_cast<Sample>((std::uint64_t{a} * alpha_a + std::uint64_t{b} * alpha_b + sum / 2) /
+                             sum);
+}
+template <>
+float Weighted(float a, float alpha_a, float b, float alpha_b) {
+  return (a * alpha_a + b * alpha_b) / (alpha_a + alpha_b);
+}
+
+template <class Pixel>
+Pixel AveragePixel(const Pixel& a, const Pixel& b) {
+  if (a.alpha == b.alpha && a.alpha > 0) {
+    return {a.alpha, Average(a.red, b.red), Average(a.green, b.green), Average(a.blue, b.blue)};
+  }
+  if (!(a.alpha + b.alpha > 0)) return {};
+  const auto weighted = [&](auto of_a, auto of_b) {
+    return Weighted(of_a, a.alpha, of_b, b.alpha);
+  };
+  return {Average(a.alpha, b.alpha), weighted(a.red, b.red), weighted(a.green, b.green),
+          weighted(a.blue, b.blue)};
+}
+
 template <class Pixel>
 void KeepFieldOf(Picture& picture, int parity) {
   const int height = picture.height();
@@ -32,10 +57,7 @@ void KeepFieldOf(Picture& picture, int parity) {
     const Pixel* above = picture.row<Pixel>(y > 0 ? y - 1 : y + 1);
     const Pixel* below = picture.row<Pixel>(y + 1 < height ? y + 1 : y - 1);
     Pixel* row = picture.row<Pixel>(y);
-    for (int x = 0; x < picture.width(); ++x) {
-      row[x] = {Average(above[x].alpha, below[x].alpha), Average(above[x].red, below[x].red),
-                Average(above[x].green, below[x].green), Average(above[x].blue, below[x].blue)};
-    }
+    for (int x = 0; x < picture.width(); ++x) row[x] = AveragePixel(above[x], below[x]);
   }
 }
 

@@ -95,7 +95,8 @@ HX_World WorldOf(const Picture& picture);
 void FillPicture(Picture& picture, const std::function<HX_PixelFloat(int x, int y)>& colour);
 
 // Replaces the lines of the other parity (0: lines 0, 2, 4 ...) by the average of the lines above
-// and below; at the frame's edge by the nearest. A frame of one line stays as it is.
+// and below, colours weighted by alpha; at the frame's edge by the nearest. A frame of one line
+// stays as it is.
 void KeepField(Picture& picture, int parity);
 
 // Fills `to` from all of `from`, as CopyWorld does. Both are top-down.

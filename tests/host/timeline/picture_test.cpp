@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <tuple>
+
 #include "tests/host/timeline/drawn_media.h"
 
 namespace calmframe::host {
@@ -28,6 +30,30 @@ void ExpectFields(PixelKind kind) {
       EXPECT_EQ(picture->row<Pixel>(y)[2].alpha, 1);
     }
   }
+}
+
+// (100 * 200 + 50 * 80) / 150; all of the one that isn't clear; nothing of two clear ones.
+template <class Pixel>
+void ExpectWeights(PixelKind kind) {
+  const auto picture = PicturePool::Make()->NewPicture(kind, 3, 3);
+  const Pixel lines[][3] = {{{100, 200, 9, 0}, {0, 7, 7, 7}, {0, 7, 7, 7}},
+                            {{1, 1, 1, 1}, {1, 1, 1, 1}, {1, 1, 1, 1}},
+                            {{50, 80, 9, 150}, {200, 30, 40, 50}, {0, 90, 90, 90}}};
+  for (int i = 0; i < 9; ++i) picture->row<Pixel>(i / 3)[i % 3] = lines[i / 3][i % 3];
+  KeepField(*picture, 0);
+  const Pixel expected[] = {{75, 160, 9, 50}, {100, 30, 40, 50}, {0, 0, 0, 0}};
+  for (int x = 0; x < 3; ++x) {
+    const Pixel &found = picture->row<Pixel>(1)[x], &e = expected[x];
+    EXPECT_EQ(std::tie(found.alpha, found.red, found.green, found.blue),
+              std::tie(e.alpha, e.red, e.green, e.blue))
+        << x;
+  }
+}
+
+TEST(Picture, AFieldsColoursCountAsMuchAsTheirAlpha) {
+  ExpectWeights<HX_Pixel8>(PixelKind::argb8);
+  ExpectWeights<HX_Pixel16>(PixelKind::argb16);
+  ExpectWeights<HX_PixelFloat>(PixelKind::argbf);
 }
 
 TEST(Picture, AFieldFillsItsFrameFromItsOwnLines) {
