@@ -165,19 +165,17 @@ StabilizerState* StabilizerEffect::GetState() {
 }
 
 HX_Handle StabilizerEffect::AllocateInstanceHandle(std::uint64_t size) {
-  return NewInstanceHandle(context(), size);
+  return NewLiveHandle(context(), size);
 }
 
 void StabilizerEffect::CreateStateInHandle(HX_Handle handle, bool keep_jobs) {
   const InstanceHandleLock header(context(), handle);
-  if (header->flattened) throw std::int32_t{HX_ERR_HANDLE_LOCK};
-  header->state = new StabilizerState(*context().in, keep_jobs);
+  header.SetState(std::make_unique<StabilizerState>(*context().in, keep_jobs));
 }
 
 void StabilizerEffect::DestroyStateInHandle(HX_Handle handle) {
-  if (!StateOfHandle(context(), handle)) return;
-  const InstanceHandleLock header(context(), handle);
-  const std::unique_ptr<StabilizerState> state(std::exchange(header->state, nullptr));
+  if (InspectInstance(context(), handle) != FlattenedInstance::Live) return;
+  const std::unique_ptr<StabilizerState> state = InstanceHandleLock(context(), handle).TakeState();
 }
 
 void StabilizerEffect::CreateInstanceState(bool render_copy) {
@@ -197,7 +195,7 @@ void StabilizerEffect::FlattenInstance() {
     // same again finds its job.
     const InstanceHandleLock header(context(), live);
     DetachSharedData();
-    const std::unique_ptr<StabilizerState> state(std::exchange(header->state, nullptr));
+    const std::unique_ptr<StabilizerState> state = header.TakeState();
   }
   in.instance_handle = context().out->instance_handle = flat.release();
   in.cb->dispose_handle(live);
@@ -212,9 +210,11 @@ void StabilizerEffect::ReloadInstance() {
   std::unique_ptr<StabilizerState> state = StateOfFlattened(context(), kind);
   if (state) state->unpublished = UntoldStatus(*state, GetFloatParam(kAnalysisStatusCounterIndex));
   OwnedHandle live(*in.cb, AllocateInstanceHandle(kLivePayloadLength));
-  {
-    const InstanceHandleLock header(context(), live.get());  // may throw, so ahead of the release
-    header->state = state.release();
+  try {
+    InstanceHandleLock(context(), live.get()).SetState(std::move(state));
+  } catch (...) {
+    ForgetLiveHandle(live.get());
+    throw;
   }
   in.instance_handle = context().out->instance_handle = live.release();
   in.cb->dispose_handle(stored);

@@ -118,6 +118,8 @@ TEST_F(StoredServiceTest, WhatCannotBeReadIsToldAndWaitsForAnalyze) {
     std::string message;
     int width = 96;
   } cases[] = {
+      {with(4, 0), damaged},  // an address that is none of a state, as if the handle lived
+      {with(4, 0).replace(8, 8, 8, '\0'), damaged},
       {with(0, 2), again + "the project data is from an old version."},
       {with(0, 17), again + "the project data is from a newer version."},
       {with(0, 12), damaged},  // whose payloads are deflated whatever the flag says
