@@ -116,7 +116,9 @@ void AnalysisEffect::StartAnalysisFromUI() {
       UpdateStartStopButtonEnablement(true, false, nullptr);
     } catch (...) {  // the first failure is the one that counts
     }
-    if (started) MarkAnalysisFailed();
+    // A state that could not be taken apart has its results still.
+    const AnalysisState* const state = started ? GetState() : nullptr;
+    if (state != nullptr && state->table().frame_count == 0) MarkAnalysisFailed();
     if ((context().out->out_flags & HX_OUT_FLAG_SHOW_MESSAGE) == 0) throw;
   }
 }
@@ -139,9 +141,9 @@ void AnalysisEffect::CancelAnalysis(AnalysisState* state, HX_ParamDef** params, 
   if (state == nullptr || !state->analyzer) return;
   const std::string text = GetCancelMessage();
   EndJob(context(), *state->analyzer, text);
-  state->analyzer.reset();
-  if (show_text) kelp::effect::ShowInfoText(context(), text.c_str(), nullptr);
+  state->DropAnalyzer();
   if (params != nullptr) PublishStatus(FrameStatus::PressAnalyze);
+  if (show_text) kelp::effect::ShowInfoText(context(), text.c_str(), nullptr);
 }
 
 bool AnalysisEffect::ServiceAnalysis(bool from_render) {
@@ -192,8 +194,8 @@ void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
   std::uint8_t may = 0;
   ThrowIfFailed(suite->MayStart(context().in->effect_ref, &may));
   const boost::logic::tribool detailed = state.detailed;
-  boost::shared_ptr<Analyzer> analyzer;
-  analyzer.swap(state.analyzer);
+  const boost::shared_ptr<Analyzer> analyzer = state.analyzer;
+  state.DropAnalyzer();
   // One that can't start is gone, so that it is not tried again with each tick.
   try {
     analyzer->Start(context().in, context().out);
@@ -242,7 +244,7 @@ void AnalysisEffect::EndPolledAnalysis(AnalysisState& state, bool finished, bool
     kelp::effect::ForceRerender(context());
   }
   state.analyzer->Stop(context().in, context().out);
-  state.analyzer.reset();
+  state.DropAnalyzer();
   PublishSharedData();
   kelp::effect::ForceRerender(context());
   RefreshParams();

@@ -21,12 +21,17 @@ void AnalysisState::Begin(HX_InData* host_in, HX_OutData* host_out,
   error_text.clear();
 }
 
+void AnalysisState::DropAnalyzer() {
+  analyzer.reset();
+  analysis_pending = false;
+}
+
 void AnalysisState::EndAnalyzer(HX_InData* host_in, HX_OutData* host_out) {
   if (!analyzer) return;
   if (analyzer->IsActive()) analyzer->Cancel(host_in, host_out, "");
   // Of an ended job too: else its table would stay in the registry for ever.
   analyzer->Stop(host_in, host_out);
-  analyzer.reset();
+  DropAnalyzer();
 }
 
 bool AnalysisState::TakeResults() {

@@ -32,6 +32,8 @@ class AnalysisState {
              const marrow::tracking::SelectorParams& selector,
              const marrow::tracking::TrackerParams& tracker, bool detailed,
              const JobFactory& make_job);
+  // Forgets the analyzer, and with it that one was pending.
+  void DropAnalyzer();
   // Cancels and stops the analyzer, if any, and drops it.
   void EndAnalyzer(HX_InData* host_in, HX_OutData* host_out);
   // Takes over the results of the analyzer's job and what they were made from. False, and nothing

@@ -208,7 +208,10 @@ void StabilizerEffect::ReloadInstance() {
   const FlattenedInstance kind = InspectInstance(context(), stored);
   if (kind == FlattenedInstance::Live) return;
   std::unique_ptr<StabilizerState> state = StateOfFlattened(context(), kind);
-  if (state) state->unpublished = UntoldStatus(*state, GetFloatParam(kAnalysisStatusCounterIndex));
+  if (state) {
+    const double counter = GetFloatParam(kAnalysisStatusCounterIndex);
+    state->unpublished = UntoldStatus(state.get(), counter);
+  }
   OwnedHandle live(*in.cb, AllocateInstanceHandle(kLivePayloadLength));
   try {
     InstanceHandleLock(context(), live.get()).SetState(std::move(state));
@@ -239,6 +242,9 @@ bool StabilizerEffect::ServiceAnalysis(bool from_render) {
   }
   if (AnalysisEffect::ServiceAnalysis(from_render)) return true;
   StabilizerState* const state = GetState();
+  // Whatever ended the work without a word.
+  const FrameStatus end = UntoldEnd(state, GetFloatParam(kAnalysisStatusCounterIndex));
+  if (end != FrameStatus::None) PublishStatus(end);
   if (!state) {
     PublishSharedData();
     return false;

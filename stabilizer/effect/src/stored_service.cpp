@@ -94,7 +94,10 @@ void KeepJobThatCanGoOn(const HostContext& context, StabilizerState& state) {
     return;
   }
   state.EndAnalyzer(context.in, context.out);  // a failed job would keep its frames
-  state.analysis_pending = false;
+}
+
+FrameStatus ToldStatus(double counter) {
+  return static_cast<FrameStatus>(std::llround(std::fmod(counter, 100)));
 }
 
 }  // namespace
@@ -125,12 +128,21 @@ std::unique_ptr<StabilizerState> StateOfFlattened(const HostContext& context,
   return state;
 }
 
-FrameStatus UntoldStatus(const StabilizerState& state, double counter) {
-  if (state.analyzer || (state.has_frames() && state.needs_solve)) return FrameStatus::None;
-  const FrameStatus status = state.SettledStatus();
-  const auto told = static_cast<FrameStatus>(std::llround(std::fmod(counter, 100)));
+FrameStatus UntoldStatus(const StabilizerState* state, double counter) {
+  if (state && (state->analyzer || (state->has_frames() && state->needs_solve))) {
+    return FrameStatus::None;
+  }
+  const FrameStatus status = state ? state->SettledStatus() : FrameStatus::PressAnalyze;
+  const FrameStatus told = ToldStatus(counter);
   const bool idle = status == FrameStatus::PressAnalyze && told == FrameStatus::None;
   return told == status || idle ? FrameStatus::None : status;
+}
+
+FrameStatus UntoldEnd(const StabilizerState* state, double counter) {
+  const FrameStatus told = ToldStatus(counter);
+  const bool waits =
+      told >= FrameStatus::AnalysisInProgress && told <= FrameStatus::SubsequentSolveOnDeletion;
+  return waits ? UntoldStatus(state, counter) : FrameStatus::None;
 }
 
 }  // namespace kelp::effect

@@ -19,7 +19,10 @@ std::unique_ptr<StabilizerState> StateOfFlattened(const HostContext& context,
                                                   FlattenedInstance kind);
 
 // What the host has to be told of a state that comes from a project, where it was not told, or
-// could not be, when that was saved. counter: the project's AnalysisStatusCounter.
-analysis::FrameStatus UntoldStatus(const StabilizerState& state, double counter);
+// could not be, when that was saved. A null state has no frames. counter: the project's
+// AnalysisStatusCounter.
+analysis::FrameStatus UntoldStatus(const StabilizerState* state, double counter);
+// The same of a state at rest, for a host that was told of work and waits for its end; else None.
+analysis::FrameStatus UntoldEnd(const StabilizerState* state, double counter);
 
 }  // namespace kelp::effect

@@ -1,5 +1,7 @@
 #include <gtest/gtest.h>
 
+#include <set>
+
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "tests/support/hosted_effect.h"
 
@@ -111,6 +113,57 @@ TEST(AnalysisServiceTest, TheUsersDetailedAnalysisTracksMore) {
       EXPECT_EQ(TableOf(*effect.GetState()).feature_count, detailed ? 2000 : 500);
     });
   }
+}
+
+// Whatever is refused while an analysis is ended or begun again, and whatever is refused once more:
+// the host learns how it stands, and what was solved can still be changed.
+TEST(AnalysisServiceTest, ARefusalLeavesNobodyWaiting) {
+  HostedEffect hosted(SmallClip());
+  const auto tour = [&hosted](const std::string& name, const std::function<void()>& act) {
+    SCOPED_TRACE(name);
+    Operations::Get().FailAlways(name);
+    act();
+    Operations::Get().FailNone();
+    EXPECT_TRUE(hosted.Tick().ok());
+    hosted.Messages();
+    return hosted.Settle();
+  };
+  const auto running = [&hosted] {
+    if (hosted.session().effects().size() > 0) hosted.Remove();
+    hosted.Apply();
+    hosted.Tick();
+    EXPECT_EQ(hosted.Status(), 4);
+  };
+  for (const char* name : {"Adv App.InfoText", "acquire HX OV Adv App Suite"}) {
+    running();
+    EXPECT_EQ(tour(name, [&hosted] { EXPECT_FALSE(hosted.Press(kCancel).ok()); }), 1);
+  }
+  running();
+  const auto names = HostedEffect::OperationsOf([&hosted] { hosted.Set(kDetailedAnalysis, 1); });
+  for (const std::string& name : std::set<std::string>(names.begin(), names.end())) {
+    running();
+    const int status = tour(name, [&hosted] { hosted.Set(kDetailedAnalysis, 1); });
+    EXPECT_TRUE(status == 1 || status == 8) << name << " " << status;
+    if (status == 1) continue;
+    const int again = tour(name, [&hosted] { hosted.Set(kDetailedAnalysis, 0); });
+    if (again == 8) {
+      EXPECT_NE(hosted.RunsFor(kSmoothness, 20), "") << name;
+    }
+  }
+}
+
+// What a project says of an analysis that waits is of that analysis alone.
+TEST(AnalysisServiceTest, ACancelledAnalysisOfAProjectIsPendingNoMore) {
+  HostedEffect hosted(SmallClip());
+  hosted.Apply();
+  hosted.Open(hosted.Altered(hosted.Save(), [](SavedState& state) {
+    ASSERT_TRUE(state.job);
+    state.analysis_pending = true;
+  }));
+  EXPECT_TRUE(hosted.Press(kCancel).ok());
+  hosted.Inside([](kelp::effect::StabilizerEffect& effect) {
+    EXPECT_EQ(effect.GetStatusForFrame(0), kelp::analysis::FrameStatus::PressAnalyze);
+  });
 }
 
 TEST(AnalysisServiceTest, ARefusedLayerKeepsItsTextForTheUser) {
