@@ -32,6 +32,13 @@ void EndJob(const kelp::effect::HostContext& context, Analyzer& analyzer,
   analyzer.Stop(context.in, context.out);
 }
 
+// Throws HX_ERR_LAYER_REFUSED, with a message, for a layer that shows nothing.
+void ExpectFrames(const kelp::effect::HostContext& context) {
+  if (ReadJobInput(context.in, context.out).Duration.numerator > 0) return;
+  kelp::effect::ShowMessage(context, tessel::config::Localizer::Localize(kEmptyLayer).c_str());
+  throw std::int32_t{HX_ERR_LAYER_REFUSED};
+}
+
 }  // namespace
 
 void AnalysisEffect::UpdateButton(std::int32_t id, bool enabled, const char* name) {
@@ -108,7 +115,7 @@ void AnalysisEffect::StartAnalysisFromUI() {
     UpdateStartStopButtonEnablement(false, true, nullptr);
     const ScopedSuite<HX_AnalysisHostSuite1> suite(context());
     ThrowIfFailed(suite->ScheduleAnalysis(context().in->effect_ref));
-    ReadJobInput(context().in, context().out);
+    ExpectFrames(context());
     started = true;
     RestartAnalysis();
   } catch (...) {
@@ -126,6 +133,7 @@ void AnalysisEffect::StartAnalysisFromUI() {
 void AnalysisEffect::StartAnalysis() {
   AnalysisState* const state = GetState();
   if (state == nullptr) return;
+  ExpectFrames(context());
   DropSolveJob();
   const marrow::tracking::SelectorParams selector = GetSelectorParams();
   const marrow::tracking::TrackerParams tracker = GetTrackerParams();
@@ -172,8 +180,6 @@ void AnalysisEffect::PollAnalysis(AnalysisState& state) {
     return;
   }
   const JobState job = analyzer->GetStatus().state;
-  const bool failed_with_text =
-      analyzer->ReportFailure(context().in, context().out) && !analyzer->GetErrorText().empty();
   if (job == JobState::Running && analyzer->job_stage() != JobStage::SeenRunning) {
     analyzer->set_job_stage(JobStage::SeenRunning);
     state.progress.start_tick = HighPrecisionTime::Now();
@@ -185,6 +191,8 @@ void AnalysisEffect::PollAnalysis(AnalysisState& state) {
     analyzer->set_job_stage(JobStage::SeenEnded);
     kelp::effect::ForceRerender(context());
   } else {
+    const bool failed_with_text =
+        analyzer->ReportFailure(context().in, context().out) && !analyzer->GetErrorText().empty();
     EndPolledAnalysis(state, job == JobState::Finished, failed_with_text);
   }
 }
@@ -232,7 +240,7 @@ void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
 }
 
 void AnalysisEffect::EndPolledAnalysis(AnalysisState& state, bool finished, bool failed_with_text) {
-  if (finished && state.TakeResults()) {
+  if (finished && state.TakeResults() && state.table().frame_count > 0) {
     MarkNeedsSolve();
     PublishStatus(state.first_analysis ? FrameStatus::SolveInProgress
                                        : FrameStatus::SubsequentSolve);

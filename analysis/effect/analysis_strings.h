@@ -14,4 +14,8 @@ const char* AnalysisStatusLiteral(std::int32_t status);
 inline constexpr char kCancelButtonInitializing[] =
     "$$$/kelp/analysis/parameter/name/CancelButtonInitializing=Initializing...";
 
+// To the user who wants a layer analysed that has been cut to nothing.
+inline constexpr char kEmptyLayer[] =
+    "$$$/kelp/analysis/error/EmptyLayer=The layer shows no frames to analyze.";
+
 }  // namespace kelp::analysis::effect

@@ -6,6 +6,7 @@
 #include "analysis/effect/analysis_ui_data.h"
 #include "analysis/effect/banner.h"
 #include "analysis/effect/effect_parameters.h"
+#include "effect/host_text.h"
 #include "effect/suite.h"
 #include "platform/hx/hx_exports.h"
 #include "stabilizer/effect/src/fcd_table.h"
@@ -276,11 +277,14 @@ bool RenderService::RenderStabilized(RenderFrames& frames, HX_World& output) {
   return true;
 }
 
-void RenderService::SendPolygon(std::size_t frame, const std::vector<float>& polygon) {
+// The picture stands without its outline.
+void RenderService::SendPolygon(std::size_t frame, const std::vector<float>& polygon) try {
   const ScopedSuite<HX_StabilizerHostSuite7> suite(context_);
   ThrowIfFailed(suite->SetFramePolygon(context_.in->effect_ref,
                                        static_cast<std::uint32_t>(polygon.size() / 2),
                                        polygon.data(), static_cast<std::int32_t>(frame)));
+} catch (std::int32_t) {
+  ClearMessage(context_);
 }
 
 }  // namespace kelp::effect

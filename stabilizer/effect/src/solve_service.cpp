@@ -129,7 +129,7 @@ void SolveService::ReportSizeMismatch() {
 void SolveService::ShowProgress() {
   static constexpr const char* kDots[] = {".  ", ".. ", "...", " ..", "  .", "   "};
   std::string name = GetString(context_, kStringStabilization);
-  if (state_.solver) name += kDots[state_.solver->GetPollCount() % std::size(kDots)];
+  if (state_.IsWorkingOnResults()) name += kDots[state_.solver->GetPollCount() % std::size(kDots)];
   UpdateParamUI(context_, kStabilizationGroupIndex, {std::nullopt, name.c_str()});
 }
 

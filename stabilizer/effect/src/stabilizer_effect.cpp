@@ -298,7 +298,7 @@ void StabilizerEffect::RefreshParams() {
   const bool auto_scales = framing == Framing::crop_auto_scale;
   enable(kSmoothnessIndex, !no_motion);
   if (state && crops(framing)) SolveService(*this, *state).ShowAutoScale();
-  if (state && !state->analyzer) SolveService(*this, *state).ShowProgress();
+  if (state) SolveService(*this, *state).ShowProgress();
   enable(kCropLessSmoothMoreIndex, crops(framing) && !no_motion);
   for (const std::int32_t index :
        {kAutoScaleGroupIndex, kMaximumScaleIndex, kActionSafeMarginIndex}) {

@@ -152,6 +152,44 @@ TEST(AnalysisServiceTest, ARefusalLeavesNobodyWaiting) {
   }
 }
 
+TEST(AnalysisServiceTest, AFailedJobIsToldOnce) {
+  HostedEffect hosted(SmallClip());
+  hosted.Apply();
+  hosted.HoldAtFrame(0);
+  hosted.TickUntilHeld();
+  hosted.Tick();  // sees it run
+  hosted.host().media().faults.null_frame = true;
+  hosted.Release();
+  EXPECT_EQ(hosted.Settle(), 1);
+  EXPECT_EQ(hosted.Messages().size(), 1u);
+  hosted.host().media().faults.null_frame = false;
+}
+
+TEST(AnalysisServiceTest, ALayerWithoutFramesIsToldAndLeftAlone) {
+  HostedEffect hosted(SmallClip());
+  const std::vector<std::string> text = {"The layer shows no frames to analyze."};
+  hosted.Place(0, 0);
+  EXPECT_TRUE(hosted.Apply().creation().ok());
+  EXPECT_EQ(hosted.Messages(), text);
+  EXPECT_EQ(hosted.Settle(), 0);
+  hosted.Place(0, 8);
+  hosted.Press(kAnalyze);
+  EXPECT_EQ(hosted.Settle(), 8);
+  hosted.Place(0, 0);
+  EXPECT_TRUE(hosted.Set(kDetailedAnalysis, 1).ok());
+  EXPECT_EQ(hosted.Messages(), text);
+  EXPECT_FALSE(hosted.Warp(3).empty());
+  // A job that is of no frames already.
+  hosted.Remove();
+  hosted.Place(0, 8);
+  hosted.Apply();
+  hosted.Open(hosted.Altered(hosted.Save(), [](SavedState& state) {
+    state.job->job_guid = tessel::utility::Guid::MakeUnique();
+    state.job->job_input_parameters.Duration.numerator = 0;
+  }));
+  EXPECT_EQ(hosted.Settle(), 1);
+}
+
 // What a project says of an analysis that waits is of that analysis alone.
 TEST(AnalysisServiceTest, ACancelledAnalysisOfAProjectIsPendingNoMore) {
   HostedEffect hosted(SmallClip());

@@ -168,6 +168,15 @@ TEST_F(RenderServiceTest, AFailingRenderSaysSo) {
   expect(Path::planned, "plan.checkout_layer", 2);
   expect(Path::planned, "render.checkout_layer_pixels", 2);
   expect(Path::planned, "render.checkout_output", 1);
+  for (const char* name : {"Stabilizer Host.SetFramePolygon", "acquire Stabilizer Host Suite"}) {
+    Operations::Get().FailAlways(name);
+    for (const Path path : {Path::direct, Path::planned}) {
+      const RenderedFrame frame = hosted().Render(Whole(0), path);
+      EXPECT_TRUE(frame.result.ok() && frame.pixels) << "the outline alone is missing";
+    }
+    Operations::Get().FailNone();
+  }
+  EXPECT_TRUE(hosted().Messages().empty());
 }
 
 }  // namespace

@@ -133,6 +133,18 @@ TEST_F(SolveServiceTest, ASolveAtWorkIsKeptAndShowsThatItLives) {
   EXPECT_EQ(hosted.Name(kGroup), "Stabilization");
 }
 
+TEST_F(SolveServiceTest, AnAnalysisThatEndsASolveTakesItsDotsAway) {
+  hosted.HoldSolve();
+  hosted.Set(kSmoothness, 30);
+  hosted.TickUntilHeld();
+  hosted.Tick();
+  EXPECT_EQ(hosted.Name(kGroup).size(), 16u);
+  const std::jthread release = hosted.ReleaseSoon();
+  hosted.Set(kDetailedAnalysis, 1);
+  EXPECT_EQ(hosted.Status(), 4);
+  EXPECT_EQ(hosted.Name(kGroup), "Stabilization");
+}
+
 // Whoever waits for the host's wake need not look by himself.
 TEST_F(SolveServiceTest, ASolveThatEndsBringsTheHostBack) {
   hosted.HoldSolve("End - RunCropper()");
