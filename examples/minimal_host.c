@@ -28,8 +28,9 @@ enum {
   kRate = 30, /* frames a second; one tick of the layer's time is one frame */
   kMaxParams = 128,
   kStatusCounterId = 302, /* disk id of the parameter whose last two digits tell the status */
+  kStatusNotAnalysed = 1, /* what an analysis that failed ends in; its message told why */
   kStatusReady = 8,
-  kFirstFailure = 9
+  kStatusSolveFailed = 10
 };
 static const int64_t kTicksPerFrame = HX_TICKS_PER_SECOND / kRate;
 
@@ -828,12 +829,12 @@ static int Tour(const char* picture_path) {
 
   const struct timespec pause = {0, 20 * 1000 * 1000};
   int status = 0;
-  for (int tick = 0; tick < 6000 && status < kStatusReady; ++tick) {
+  while (status != kStatusReady) {
     if (Command(HX_CMD_IDLE_TICK, &instance, 0, NULL, &out) != HX_ERR_NONE) return 1;
     if (status != Status()) printf("status %d\n", status = Status());
+    if (status == kStatusNotAnalysed || status == kStatusSolveFailed) return 1;
     nanosleep(&pause, NULL);
   }
-  if (status != kStatusReady) return 1;
 
   const int frame = kFrames / 2;
   HX_World output;
