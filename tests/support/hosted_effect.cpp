@@ -4,22 +4,13 @@
 #include <chrono>
 #include <cstring>
 #include <set>
-#include <type_traits>
 
 #include "host/pixels/world_operations.h"
 #include "stabilizer/effect/src/instance_handle.h"
 #include "stabilizer/effect/src/stabilizer_effect.h"
 #include "stabilizer/effect/src/state_format/state_reader.h"
 #include "stabilizer/effect/src/state_format/state_writer.h"
-
-// The plug-in's own, see stabilizer/effect/src/plugin_entry.cpp and renderer_exports.cpp.
-extern "C" {
-std::remove_pointer_t<HX_EffectMain> EffectMainExtra;
-std::remove_pointer_t<HX_AllowCUDARendering> allowCUDARendering;
-std::remove_pointer_t<HX_GetOVVarVector> getOVVarVector;
-std::remove_pointer_t<HX_GetCropWindow> getCropWindow;
-std::remove_pointer_t<HX_GetStabilizerData> getStabilizerData;
-}
+#include "tests/support/linked_plugin.h"
 
 namespace calmframe::host {
 namespace {
@@ -53,14 +44,6 @@ HX_Err Entry(std::uint32_t command, HX_InData* in, HX_OutData* out, HX_ParamDef*
   return code;
 }
 
-PluginLibrary Linked() {
-  PluginProperties properties;
-  properties.match_name = "KLPX SubspaceStabilizer";
-  properties.entry = "EffectMainExtra";
-  return PluginLibrary(Entry, properties,
-                       {allowCUDARendering, getOVVarVector, getCropWindow, getStabilizerData});
-}
-
 }  // namespace
 
 HostedEffect::HostedEffect(const HostedSettings& settings) {
@@ -68,7 +51,7 @@ HostedEffect::HostedEffect(const HostedSettings& settings) {
   HostSettings host;
   host.media.cache_bytes = std::size_t{16} << 20;
   host.keeps_analysis_raw = settings.keeps_analysis_raw;
-  host_ = std::make_unique<Host>(Linked(), host);
+  host_ = std::make_unique<Host>(LinkedPlugin(Entry), host);
   host_->handles().MoveOnUnlock(true);
   host_->worlds().SetRowPadding(16);
   session_ = std::make_unique<Session>(*host_);
