@@ -39,9 +39,7 @@ void AnalyzeCommand::Analyze(Opening opening, ProgressLine& progress) const {
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
   const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
-  if (const CropTrouble trouble = CropTroubleOf(clip); !trouble.line.empty()) {
-    progress.Warn(trouble.line);
-  }
+  CheckCrop(clip, progress);
   if (run_.json) {
     const std::unique_ptr<CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;

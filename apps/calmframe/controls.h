@@ -10,6 +10,13 @@
 
 namespace calmframe {
 
+// Items of HX_FRAMING, and of HX_RESULT.
+inline constexpr double kStabilizeOnly = 1, kCrop = 2, kCropAutoScale = 3, kSynthesizeEdges = 4;
+inline constexpr double kSmoothMotion = 1, kNoMotion = 2;
+inline bool Crops(double framing) {
+  return framing == kCrop || framing == kCropAutoScale;
+}
+
 // How a command line sets the effect's controls.
 struct ControlFlags {
   std::map<std::int32_t, double> values;  // of the controls with a flag, by disk id; those given

@@ -9,17 +9,20 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
+#include "platform/hx/hx_controls.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
 namespace {
 
+constexpr std::int32_t kSafeMargin = HX_ACTION_SAFE_MARGIN.disk_id;
+constexpr std::int32_t kMaximumScale = HX_MAXIMUM_SCALE.disk_id;
+constexpr std::int32_t kAdditionalScale = HX_ADDITIONAL_SCALE.disk_id;
+
 // The share of the picture that stays black because the controls stop its enlargement, 0 to 1.
 double BlackShare(const SteadyClip& clip, double width, const CropWindow& crop) {
-  constexpr std::int32_t kSafeMargin = 3, kMaximumScale = 4, kAdditionalScale = 16, kFraming = 22;
-  constexpr double kAutoScale = 3;
   // Whoever asks for a border or a smaller picture has one.
-  if (clip.ValueOf(kFraming) != kAutoScale || clip.ValueOf(kSafeMargin) > 0 ||
+  if (clip.ValueOf(HX_FRAMING.disk_id) != kCropAutoScale || clip.ValueOf(kSafeMargin) > 0 ||
       clip.ValueOf(kAdditionalScale) < 100) {
     return 0;
   }
@@ -31,9 +34,9 @@ double BlackShare(const SteadyClip& clip, double width, const CropWindow& crop) 
 }  // namespace
 
 CropTrouble CropTroubleOf(SteadyClip& clip) {
+  if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return {};
   const std::unique_ptr<CropWindow> crop = clip.Crop();
-  if (!crop) return {};
-  if (crop->width <= 0 || crop->height <= 0) {
+  if (!crop || crop->width <= 0 || crop->height <= 0) {
     return {
         "no part of the picture stays in view; set --framing stabilize-only or adjust other flags",
         true};
@@ -42,20 +45,28 @@ CropTrouble CropTroubleOf(SteadyClip& clip) {
   const double width = static_cast<double>(info.width) *
                        static_cast<double>(info.pixel_aspect.num) /
                        static_cast<double>(info.pixel_aspect.den);
+  // Without motion there is nothing to smooth.
+  const std::string gentler =
+      clip.ValueOf(HX_RESULT.disk_id) == kNoMotion ? "--result smooth-motion" : "less --smoothness";
   const std::string window = std::to_string(crop->width) + "x" + std::to_string(crop->height);
   constexpr double kBlack = 0.02;  // of the picture; less is a line at its edge
   if (const double black = BlackShare(clip, width, *crop); black > kBlack) {
-    const double needed = std::max(width / crop->width, double(info.height) / crop->height);
+    // The additional scale enlarges what the maximum scale has let through.
+    const double needed = std::max(width / crop->width, double(info.height) / crop->height) * 100 /
+                          clip.ValueOf(kAdditionalScale);
+    const double percent = std::ceil(100 * needed);
+    const std::string would_fill =
+        percent <= HX_MAXIMUM_SCALE.max
+            ? " and would fill it at --maximum-scale " + std::to_string(static_cast<int>(percent))
+            : "";
     return {std::to_string(std::lround(100 * black)) +
-            " % of the picture stays black: the crop window is " + window +
-            " and would fill it at --maximum-scale " +
-            std::to_string(static_cast<int>(std::ceil(100 * needed))) +
-            "; less --smoothness crops less"};
+            " % of the picture stays black: the crop window is " + window + would_fill + "; " +
+            gentler + " crops less"};
   }
   constexpr double kSmall = 0.4;  // of a side
   if (crop->width >= kSmall * width && crop->height >= kSmall * info.height) return {};
   return {"of " + std::to_string(info.width) + "x" + std::to_string(info.height) + " pixels only " +
-          window + " stay in view; less --smoothness or --framing stabilize-only keeps more"};
+          window + " stay in view; " + gentler + " or --framing stabilize-only keeps more"};
 }
 
 void CheckCrop(SteadyClip& clip, ProgressLine& progress) {

@@ -6,6 +6,7 @@
 #include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstring>
+#include <limits>
 #include <numeric>
 #include <utility>
 
@@ -278,7 +279,8 @@ const void* SteadyClip::FirstWarp() {
 std::unique_ptr<CropWindow> SteadyClip::Crop() {
   const HX_GetStabilizerData get = host_.library().exports().get_stabilizer_data;
   const void* block = effect_->opaque_data();
-  constexpr std::int32_t kUntouched = -1;
+  // Windows come out a little below 0 too.
+  constexpr std::int32_t kUntouched = std::numeric_limits<std::int32_t>::min();
   std::int32_t frames, first, columns, rows, width = kUntouched, height = kUntouched, w, h;
   float left, top, right, bottom;
   if (!get ||

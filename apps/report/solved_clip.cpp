@@ -80,7 +80,7 @@ std::optional<SolvedClip> ReadSolve(const host::PluginExports& exports, const vo
       solved.after.push_back(FitMotion(after, centre));
     }
     previous = warped;
-    if (solved.crop_width > 0) {
+    if (solved.crop_width > 0 && solved.crop_height > 0) {
       float left = 0, top = 0, right = 0, bottom = 0;
       exports.get_crop_window(block, frame, &left, &top, &right, &bottom);
       solved.window.push_back({(double{left} + double{right}) / 2 + double{min_x} - centre.x,

@@ -77,6 +77,10 @@ TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
   ExpectLine("stabilize in.mkv out.mkv --quiet --result no-motion", 5,
              "in.mkv: no part of the picture stays in view; set --framing");
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mkv"));
+  ExpectLine("analyze in.mkv --project p.calm --quiet --result no-motion", 5, "no part of the");
+  ExpectLine("report p.calm p.html --quiet", 0, "no part of the");
+  EXPECT_THAT(Content("p.html"), HasSubstr("Not steadied: nothing stays in view"));
+  RunWell("analyze in.mkv --project p.calm --quiet --framing synthesize-edges");
 }
 
 TEST_F(ProgramTest, InputThatIsNoClip) {
@@ -234,11 +238,16 @@ TEST_F(ProgramTest, AnalyzeTellsWithoutRendering) {
               ::testing::AllOf(HasSubstr("in.mp4: 30 frames of 160x120\ncrop window "),
                                HasSubstr("Auto-scale (1")));
   // Too little is told, and what is told is enough.
-  const std::string analyze = "analyze in.mp4 --project p.calm --quiet --maximum-scale ";
-  const std::string black = Run(analyze + "101").text;
-  ASSERT_THAT(black, HasSubstr("% of the picture stays black"));
-  const std::size_t scale = black.find("--maximum-scale ");
-  EXPECT_THAT(Run(analyze + black.substr(scale + 16, 3)).text, Not(HasSubstr("stays black")));
+  for (const std::string additional : {"100", "102"}) {
+    const std::string analyze = "analyze in.mp4 --project p.calm --quiet --additional-scale " +
+                                additional + " --maximum-scale ";
+    const std::string black = Run(analyze + "101").text;
+    ASSERT_THAT(black, HasSubstr("% of the picture stays black"));
+    const std::size_t scale = black.find("--maximum-scale ");
+    const int told = std::stoi(black.substr(scale + 16, 3));
+    EXPECT_THAT(Run(analyze + std::to_string(told)).text, Not(HasSubstr("stays black")));
+    EXPECT_THAT(Run(analyze + std::to_string(told - 4)).text, HasSubstr("stays black"));
+  }
   fs::remove(Path("p.calm"));
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4"));
 }
