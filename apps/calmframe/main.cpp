@@ -1,6 +1,7 @@
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <cctype>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -184,6 +185,7 @@ int Run(int argc, char** argv) {
                                     [](const Command* one) { return one->parser().parsed(); });
   const bool json = command.json();
   CatchInterrupts();
+  std::signal(SIGXFSZ, SIG_IGN);  // a file that may not grow is one that can't be written
   try {
     command.Run();
     return kDone;

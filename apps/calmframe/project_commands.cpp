@@ -131,7 +131,7 @@ void TracksCommand::Run() {
   controls.experimental = true;  // the button is one for experts
   const std::unique_ptr<SteadyClip> clip = OpenSaved(project_, controls);
   KeepApart(output_, {clip->path()});
-  SaveTracks(*clip, project_, file.temporary());
+  SaveTracks(*clip, project_, file.temporary(), output_);
   file.Commit();
 }
 

@@ -98,11 +98,9 @@ double PixelAspectOf(const media::ClipInfo& info) {
 report::SolvedClip SolvedOf(SteadyClip& clip, const std::string& shown) {
   const ScratchFolder folder;
   const std::string path = folder.path() / "tracks.trk";
-  SaveTracks(clip, shown, path);
-  const std::optional<report::TrackTable> tracks = report::ReadTrackFile(path);
-  if (!tracks) throw SolveFailure(shown + ": its tracks can't be read");
+  const report::TrackTable tracks = SaveTracks(clip, shown, path, path);
   std::optional<report::SolvedClip> solved =
-      report::ReadSolve(clip.host().library().exports(), clip.effect().opaque_data(), *tracks,
+      report::ReadSolve(clip.host().library().exports(), clip.effect().opaque_data(), tracks,
                         PixelAspectOf(clip.info()));
   if (!solved) throw SolveFailure(shown + ": holds no solve");
   if (clip.info().field_order != media::FieldOrder::progressive) solved->row = "field";

@@ -3,12 +3,16 @@
 #include <string>
 
 #include "apps/calmframe/steady_clip.h"
+#include "apps/report/track_table.h"
 
 namespace calmframe {
 
-// Writes the clip's tracks by the effect's own button, which is one for experts: the clip must have
-// been opened with `experimental`. `shown`: what the user calls the work. Throws SolveFailure, also
-// when nothing was written.
-void SaveTracks(SteadyClip& clip, const std::string& shown, const std::string& path);
+// Writes the clip's tracks to `path` by the effect's own button, which is one for experts: the clip
+// must have been opened with `experimental`. Returns what the file holds, read back, since the
+// button doesn't tell how it went. `work`, `file`: what the user calls the saved work and the file.
+// Throws SolveFailure where there are no tracks, media::Failure (output) where the file isn't
+// whole.
+report::TrackTable SaveTracks(SteadyClip& clip, const std::string& work, const std::string& path,
+                              const std::string& file);
 
 }  // namespace calmframe

@@ -304,6 +304,15 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   EXPECT_EQ(Run("tracks away/work.calm away/work.calm").code, 4);  // nothing is written over
   EXPECT_EQ(Run("tracks away/work.calm t.trk").code, 4);
   ExpectLine("tracks away/work.calm no/t.trk", 4, "there is no folder no\n");
+  // The old file stays where the new one can't be written whole, or at all.
+  const std::string tracks = Content("t.trk");
+  for (const char* blocks : {"100", "0"}) {
+    const Outcome cut = Run("tracks away/work.calm t.trk --overwrite",
+                            std::string("ulimit -f ") + blocks + "; ");
+    EXPECT_EQ(cut.code, 4) << blocks;
+    ExpectOneLine(cut, "t.trk: can't be written whole");
+    EXPECT_TRUE(Content("t.trk") == tracks) << blocks;
+  }
   ExpectLine("analyze other.mp4 --project away/work.calm", 3, "is of another clip");
   fs::rename(Path("other.mp4"), Path("away/in.mp4"));
   ExpectLine("render --project away/work.calm x.mkv", 3, "is not the clip");
