@@ -163,7 +163,8 @@ double ParseValue(const HX_ParamDef& param, const std::string& text) {
   };
   switch (param.kind) {
     case HX_PARAM_FLOAT_SLIDER: {
-      const auto least = double{param.u.fs.valid_min}, most = double{param.u.fs.valid_max};
+      const double least = WrittenNumber(param.u.fs.valid_min);
+      const double most = WrittenNumber(param.u.fs.valid_max);
       if (is_number && number >= least && number <= most) return number;
       return refuse(text + " is out of range: " + NumberText(least) + " to " + NumberText(most));
     }

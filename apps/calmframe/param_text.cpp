@@ -1,6 +1,8 @@
 #include "apps/calmframe/param_text.h"
 
+#include <charconv>
 #include <cstdio>
+#include <cstdlib>
 #include <sstream>
 
 namespace calmframe {
@@ -35,15 +37,25 @@ std::string NumberText(double number) {
   return text;
 }
 
+double WrittenNumber(float number) {
+  char text[32];
+  *std::to_chars(text, text + sizeof text - 1, number).ptr = 0;
+  return std::strtod(text, nullptr);
+}
+
 double DefaultOf(const HX_ParamDef& param) {
   switch (param.kind) {
     case HX_PARAM_FLOAT_SLIDER:
-      return double{param.u.fs.default_value};
+      return WrittenNumber(param.u.fs.default_value);
     case HX_PARAM_POPUP:
       return param.u.pd.default_value;
     default:
       return param.u.bd.default_value;
   }
+}
+
+bool IsChanged(const HX_ParamDef& param, double value) {
+  return static_cast<float>(value) != static_cast<float>(DefaultOf(param));
 }
 
 std::string ValueText(const HX_ParamDef& param, double value) {

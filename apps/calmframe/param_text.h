@@ -18,8 +18,14 @@ std::vector<std::string> PopupItems(const HX_ParamDef& param);
 // As short as it can be for six digits.
 std::string NumberText(double number);
 
+// A bound or default of a record, which are in single precision, as it was written: the shortest
+// decimal number that it stands for, 0.0045 and not 0.00449999981.
+double WrittenNumber(float number);
+
 // Of one that has a value.
 double DefaultOf(const HX_ParamDef& param);
+// Whether the value, of a project or of the user, differs from it by more than single precision.
+bool IsChanged(const HX_ParamDef& param, double value);
 
 // A value as --param takes it.
 std::string ValueText(const HX_ParamDef& param, double value);

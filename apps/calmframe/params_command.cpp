@@ -19,8 +19,8 @@ namespace {
 std::string RangeText(const HX_ParamDef& param) {
   if (param.kind == HX_PARAM_CHECKBOX) return "on, off";
   if (param.kind == HX_PARAM_FLOAT_SLIDER) {
-    return NumberText(double{param.u.fs.valid_min}) + " to " +
-           NumberText(double{param.u.fs.valid_max});
+    return NumberText(WrittenNumber(param.u.fs.valid_min)) + " to " +
+           NumberText(WrittenNumber(param.u.fs.valid_max));
   }
   std::string text;
   for (const std::string& item : PopupItems(param)) text += (text.empty() ? "" : " | ") + item;
@@ -33,8 +33,8 @@ nlohmann::ordered_json JsonOf(const HX_ParamDef& param, double value) {
   json["name"] = param.name;
   json["kind"] = KindText(param);
   if (param.kind == HX_PARAM_FLOAT_SLIDER) {
-    json["min"] = param.u.fs.valid_min;
-    json["max"] = param.u.fs.valid_max;
+    json["min"] = WrittenNumber(param.u.fs.valid_min);
+    json["max"] = WrittenNumber(param.u.fs.valid_max);
   } else if (param.kind == HX_PARAM_POPUP) {
     json["items"] = PopupItems(param);
   }
@@ -78,7 +78,7 @@ void ParamsCommand::Run() {
       }
       std::printf("%-32s %-9s %s (default %s)", param.name, KindText(param).c_str(),
                   RangeText(param).c_str(), ValueText(param, DefaultOf(param)).c_str());
-      if (value != DefaultOf(param)) std::printf(", now %s", ValueText(param, value).c_str());
+      if (IsChanged(param, value)) std::printf(", now %s", ValueText(param, value).c_str());
       std::printf("\n");
     }
   } catch (const host::PluginError& error) {

@@ -61,9 +61,7 @@ std::vector<report::Fact> ControlsOf(SteadyClip& clip) {
     const auto param = clip.effect().Param(clip.effect().IndexOf(declared.disk_id));
     if (!param || !IsControl(*param) || (param->ui_flags & HX_PARAM_UI_DISABLED) != 0) continue;
     const std::optional<double> value = host::ValueOf(*param);
-    if (!value || (!HasFlag(declared.disk_id) &&
-                   static_cast<float>(*value) == static_cast<float>(DefaultOf(declared))))
-      continue;
+    if (!value || (!HasFlag(declared.disk_id) && !IsChanged(declared, *value))) continue;
     const bool percent = declared.kind == HX_PARAM_FLOAT_SLIDER && (declared.u.fs.display & 1) != 0;
     facts.push_back({declared.name, ValueText(declared, *value) + (percent ? " %" : "")});
   }

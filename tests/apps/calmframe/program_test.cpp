@@ -189,6 +189,19 @@ TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {
   EXPECT_EQ(given, flags.size());
 }
 
+// Nothing was touched, so nothing is told to differ, and numbers are those that were declared.
+TEST_F(ProgramTest, SavedWorkHasTheValuesThatItWasGiven) {
+  MakeClip("in.mp4", 64, 48, 5);
+  RunWell("analyze in.mp4 --project p.calm --experimental --quiet");
+  const std::string params = "params --experimental --project p.calm ";
+  EXPECT_THAT(RunWell(params), Not(HasSubstr(", now ")));
+  const std::string json = RunWell(params + "--json");
+  for (const char* line : {"\"default\": 0.0045,", "\"value\": 0.0045\n", "\"min\": 0.001,"}) {
+    EXPECT_THAT(json, HasSubstr(line));
+  }
+  RunWell(params + "--param \"Presmoothing Factor=0.001\"");
+}
+
 // A stage begins with nothing done, never falls back, and ends with all of it.
 TEST_F(ProgramTest, JsonTellsHowFarEachStageIsAndHowItEnded) {
   const std::string no_utf8 = "in\xff.mp4";
