@@ -10,7 +10,9 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
+#include "apps/calmframe/plugin_path.h"
 #include "host/base/nearest_match.h"
+#include "host/effects/host.h"
 #include "platform/hx/hx_controls.h"
 #include "platform/tessel/debug.h"
 
@@ -140,18 +142,22 @@ bool SameWord(const std::string& a, const std::string& b) {
   });
 }
 
-// The one parameter of that name that has a value.
-const HX_ParamDef& FindParam(const std::string& name, const std::vector<HX_ParamDef>& declared) {
+// The one parameter of that name that has a value; null without.
+const HX_ParamDef* FindParam(const std::string& name, const std::vector<HX_ParamDef>& declared) {
+  const auto found = std::find_if(
+      declared.begin(), declared.end(),
+      [&name](const HX_ParamDef& param) { return IsControl(param) && SameWord(param.name, name); });
+  return found == declared.end() ? nullptr : &*found;
+}
+
+std::string UnknownText(const std::string& name, const std::vector<HX_ParamDef>& declared) {
   std::vector<std::string> names;
   for (const HX_ParamDef& param : declared) {
-    if (!IsControl(param)) continue;
-    if (SameWord(param.name, name)) return param;
-    names.push_back(param.name);
+    if (IsControl(param)) names.push_back(param.name);
   }
   const std::string nearest = NearestMatch(name, names);
-  throw UsageFailure(
-      "--param: there is no parameter '" + name + "'" +
-      (nearest.empty() ? "; calmframe params lists them" : "; did you mean '" + nearest + "'?"));
+  return "--param: there is no parameter '" + name + "'" +
+         (nearest.empty() ? "; calmframe params lists them" : "; did you mean '" + nearest + "'?");
 }
 
 double ParseValue(const HX_ParamDef& param, const std::string& text) {
@@ -218,14 +224,32 @@ std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,
                                                const std::vector<HX_ParamDef>& declared) {
   std::map<std::int32_t, double> values = flags.values;
   for (const std::string& setting : flags.params) {
-    const std::size_t sign = setting.find('=');
-    if (sign == std::string::npos) {
+    // Names have such signs too: "Max Count, 0=auto".
+    const HX_ParamDef* param = nullptr;
+    std::size_t sign = setting.find('=');
+    const std::size_t last = setting.rfind('=');
+    while (sign != std::string::npos && !(param = FindParam(setting.substr(0, sign), declared))) {
+      sign = setting.find('=', sign + 1);
+    }
+    if (last == std::string::npos) {
       throw UsageFailure("--param takes NAME=VALUE, not '" + setting + "'");
     }
-    const HX_ParamDef& param = FindParam(setting.substr(0, sign), declared);
-    values[param.disk_id] = ParseValue(param, setting.substr(sign + 1));
+    if (!param) {
+      const std::string name = setting.substr(0, last);
+      throw UnknownParam(name, UnknownText(name, declared));
+    }
+    values[param->disk_id] = ParseValue(*param, setting.substr(sign + 1));
   }
   return values;
+}
+
+void ThrowIfExperimental(const UnknownParam& unknown) {
+  ControlFlags controls;
+  controls.experimental = true;
+  ShowExperimentalParameters(controls);
+  const host::Host host(PluginPath());
+  if (!FindParam(unknown.name, host.declarations())) return;
+  throw UsageFailure("--param " + unknown.name + ": is experimental, which takes --experimental");
 }
 
 }  // namespace calmframe

@@ -3,8 +3,10 @@
 #include <cstdint>
 #include <map>
 #include <string>
+#include <utility>
 #include <vector>
 
+#include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "platform/hx/hx_params.h"
 
@@ -34,9 +36,21 @@ bool HasFlag(std::int32_t disk_id);
 // settled then.
 void ShowExperimentalParameters(const ControlFlags& flags);
 
+// --param names a parameter that the effect doesn't declare.
+class UnknownParam : public UsageFailure {
+ public:
+  UnknownParam(std::string unknown, const std::string& line)
+      : UsageFailure(line), name(std::move(unknown)) {}
+  const std::string name;
+};
+
 // Values by disk id, all of them valid, later ones of one parameter counting. `declared`: the
-// effect's parameters. Throws UsageFailure, with the nearest name for an unknown one.
+// effect's parameters. Throws UsageFailure; UnknownParam, with the nearest name.
 std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,
                                                const std::vector<HX_ParamDef>& declared);
+
+// Throws UsageFailure where the parameter is there once --experimental is given. Loads the effect
+// anew, which its host must have let go.
+void ThrowIfExperimental(const UnknownParam& unknown);
 
 }  // namespace calmframe

@@ -81,6 +81,9 @@ void ParamsCommand::Run() {
       if (IsChanged(param, value)) std::printf(", now %s", ValueText(param, value).c_str());
       std::printf("\n");
     }
+  } catch (const UnknownParam& unknown) {
+    ThrowIfExperimental(unknown);
+    throw;
   } catch (const host::PluginError& error) {
     throw SolveFailure(error.what());
   }

@@ -149,6 +149,9 @@ SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
     const host::CommandResult result = effect_->SetParam(effect_->IndexOf(disk_id), value);
     if (!result.ok()) throw SolveFailure(result.Line(path()));
   }
+} catch (const UnknownParam& unknown) {
+  ThrowIfExperimental(unknown);
+  throw;
 } catch (const host::PluginError& error) {
   throw SolveFailure(error.what());
 }

@@ -142,7 +142,9 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
                {"params --param Smothness=3", "did you mean 'Smoothness'?"},
                {"params --param \"Maximum Scale=99\"", "100 to 10000"},
                {"params --param \"Method=Perspectiv\"", "did you mean Perspective?"},
-               {"params --param Rank=4", "no parameter 'Rank'"},
+               {"params --param Rank=4", "Rank: is experimental, which takes --experimental"},
+               {"params --experimental --param \"Max Count, 0=auto=-1\"", "-1 is out of range: 0"},
+               {"params --experimental --param \"Max Count, 0=autp=1\"", "'Max Count, 0=auto'"},
                {"params --param \"Hide Warning Banner=maybe\"", "neither on nor off"},
                {"params --param Smoothness", "NAME=VALUE"},
                {"stabilize a", "OUT"},
@@ -171,7 +173,8 @@ TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {
       {"Synthesis Input Range (seconds)", {"--synthesis-input-range 0.25", 0.25}},
       {"Synthesis Edge Feather", {"--synthesis-edge-feather 6", 6}},
       {"Hide Warning Banner", {"--hide-warning-banner", 1}},
-      {"Rank", {"--experimental --param Rank=4", 4}}};
+      {"Rank", {"--experimental --param Rank=4", 4}},
+      {"Max Count, 0=auto", {"--param \"max count, 0=auto=7\"", 7}}};
   std::string all = "params --json";
   for (const auto& [name, flag] : flags) all += " " + flag.first;
   std::size_t given = 0;
