@@ -13,6 +13,7 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/plugin_path.h"
 #include "host/effects/param_table.h"
+#include "platform/hx/hx_controls.h"
 
 namespace calmframe {
 namespace {
@@ -22,7 +23,7 @@ constexpr std::int32_t kAnalyzeButton = 1;
 constexpr std::int32_t kCancelButton = 11;
 constexpr std::int32_t kStabilizationGroup = 12;
 constexpr std::int32_t kAutoScaleGroup = 17;  // its name tells the scale
-constexpr std::int32_t kMethod = 28;
+constexpr std::int32_t kMethod = HX_METHOD.disk_id;
 
 // The effect's words for what its status counter tells when it has ended without a result.
 enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
@@ -156,10 +157,17 @@ SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
   throw SolveFailure(error.what());
 }
 
-void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
+void SteadyClip::TakeAsSaved() {
+  host::SavedEffect saved;
+  const host::CommandResult result = effect_->Save(&saved);
+  if (!result.ok()) throw SolveFailure(result.Line(path()));
+}
+
+void SteadyClip::Settle(ProgressLine& progress, Progress& shown, Reuse& reuse) {
   using Work = host::Session::Work;
-  Progress shown;
-  std::uint64_t delivered_before = 0;  // the analysis, which alone asks for frames here
+  // By the analysis, which alone asks for frames here, and may be at work when it is first seen.
+  const std::uint64_t delivered_before = host_.media().counts().delivered;
+  bool analysed = false, has_new_tracks = false;
   const auto show = [&] {
     const Work work = host::Session::WorkOf(*effect_);
     const std::uint64_t delivered = host_.media().counts().delivered;
@@ -167,42 +175,66 @@ void SteadyClip::Settle(ProgressLine& progress, Reuse& reuse) {
     const std::string stage = work == Work::analysing ? "analyzing"
                               : work == Work::solving ? "solving"
                                                       : "";
-    if (stage != shown.stage && !shown.stage.empty()) {
-      shown.ends = true;
-      shown.done = shown.total;
-      progress.Show(shown);
-      shown = {};
+    if (stage.empty()) return InterruptAsked();
+    if (stage != shown.stage) End(progress, shown);
+    reuse.framing = false;
+    if (work == Work::analysing) {
+      reuse.analysis = false;
+      analysed = true;
+    } else if (std::exchange(analysed, false)) {
+      has_new_tracks = true;
+      return true;
     }
-    if (!stage.empty()) {
-      reuse.framing = false;
-      if (work == Work::analysing) reuse.analysis = false;
-      const bool begins = stage != shown.stage;
-      if (work == Work::analysing) {
-        if (begins) delivered_before = delivered;
-        shown.unit = "frames";
-        shown.total = FramesToAnalyse(*effect_->shared()->layer()->state());
-        shown.done = std::min(static_cast<double>(delivered - delivered_before), shown.total);
-      }
-      shown.stage = stage;
-      shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
-      // Nothing is done yet, whatever it says by now; or it says its bare name.
-      if (begins || shown.says.find('(') == std::string::npos) shown.says.clear();
-      progress.Show(shown);
+    const bool begins = stage != shown.stage;
+    if (work == Work::analysing) {
+      shown.unit = "frames";
+      shown.total = FramesToAnalyse(*effect_->shared()->layer()->state());
+      const auto done = static_cast<double>(delivered - delivered_before);
+      shown.done = begins ? 0 : std::min(done, shown.total);
     }
+    shown.stage = stage;
+    shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
+    // Nothing is done yet, whatever it says by now; or it says its bare name.
+    if (begins || shown.says.find('(') == std::string::npos) shown.says.clear();
+    progress.Show(shown);
     return InterruptAsked();
   };
-  const auto waited = session_.TickUntilSettled(std::chrono::hours(24 * 30), show);
-  if (IsBroken()) throw BrokenPromise();
-  if (waited != host::Session::Wait::settled) throw Interrupted();
-  show();
+  while (true) {
+    const auto waited = session_.TickUntilSettled(std::chrono::hours(24 * 30), show);
+    if (IsBroken()) throw BrokenPromise();
+    if (InterruptAsked()) throw Interrupted();
+    if (!std::exchange(has_new_tracks, false)) {
+      if (waited != host::Session::Wait::settled) throw Interrupted();
+      break;
+    }
+    TakeAsSaved();  // ahead of what is solved of them
+  }
   // The render that follows has its own pattern of buffers: what the analysis took goes back.
   malloc_trim(0);
 }
 
+void SteadyClip::End(ProgressLine& progress, Progress& shown) {
+  if (!shown.stage.empty()) {
+    shown.ends = true;
+    shown.done = shown.total;
+    progress.Show(shown);
+  }
+  shown = {};
+}
+
+void SteadyClip::SetFraming(double value) {
+  const host::CommandResult result = effect_->SetParam(effect_->IndexOf(HX_FRAMING.disk_id), value);
+  if (!result.ok()) throw SolveFailure(result.Line(path()));
+}
+
 Reuse SteadyClip::Work(ProgressLine& progress) {
   Reuse reuse{true, true, true};
+  Progress shown;
   const void* const warp = FirstWarp();
-  Settle(progress, reuse);
+  // The crop window is to be that of the warps as they are saved, so it comes behind them.
+  const double framing = ValueOf(HX_FRAMING.disk_id);
+  if (Crops(framing)) SetFraming(kStabilizeOnly);
+  Settle(progress, shown, reuse);
   // Saved work of another span, of other settings, or of none is not begun anew by itself.
   const std::int32_t analyze = effect_->IndexOf(kAnalyzeButton);
   if (const auto button = effect_->Param(analyze);
@@ -214,11 +246,17 @@ Reuse SteadyClip::Work(ProgressLine& progress) {
     reuse = {};
     const host::CommandResult pressed = effect_->Press(analyze);
     if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
-    Settle(progress, reuse);
+    Settle(progress, shown, reuse);
   }
   // An analysis that ended early has not seen all that was promised.
   if (found_ && found_->standing() != media::Standing::decoded) throw BrokenPromise();
   reuse.solve = reuse.analysis && warp && warp == FirstWarp();
+  if (!reuse.solve && FirstWarp()) TakeAsSaved();
+  if (Crops(framing) && host::Session::StatusOf(*effect_) == kReady) {
+    SetFraming(framing);
+    Settle(progress, shown, reuse);
+  }
+  End(progress, shown);
   reuse.framing = reuse.framing && reuse.solve;
   CheckResult(progress);
   return reuse;
@@ -238,11 +276,14 @@ void SteadyClip::SolveAnew(ProgressLine& progress) {
   // A method that is quick to solve for, without a word; with the first one again, nothing of it
   // stands.
   ProgressLine nothing(ProgressLine::Form::none);
+  Progress shown;
   Reuse ignored;
   effect_->SetParam(method, value == 1 ? 2.0 : 1.0);
-  Settle(nothing, ignored);
+  Settle(nothing, shown, ignored);
+  shown = {};
   effect_->SetParam(method, value);
-  Settle(progress, ignored);
+  Settle(progress, shown, ignored);
+  End(progress, shown);
   CheckResult(progress);
 }
 

@@ -85,8 +85,14 @@ class SteadyClip {
   static Medium Blank(const host::Project& project);
   SteadyClip(const host::Project* project, const Medium& medium, const ControlFlags& controls);
   bool IsBroken() const;
-  // Ticks until nothing is left to do. What was seen at work is taken from `reuse`.
-  void Settle(ProgressLine& progress, Reuse& reuse);
+  // Ticks until nothing is left to do. What was seen at work is taken from `reuse`. `shown`: the
+  // stage that was shown last and goes on until another one begins or End ends it.
+  void Settle(ProgressLine& progress, Progress& shown, Reuse& reuse);
+  static void End(ProgressLine& progress, Progress& shown);
+  // The effect goes on from what it would save, which is rounded: so a clip looks the same whether
+  // its work went through a project or not. Throws SolveFailure.
+  void TakeAsSaved();
+  void SetFraming(double value);
   // Throws SolveFailure where the effect is not ready.
   void CheckResult(ProgressLine& progress);
   // Address of the first frame's warp, which goes with its solve; null without one.

@@ -336,6 +336,21 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   EXPECT_EQ(Run("render --project gone.calm x.mkv").code, 3);
 }
 
+// Saved tracks and warps are rounded; a run that saves nothing draws from the same.
+TEST_F(ProgramTest, APictureIsTheSameThroughAProjectOrWithout) {
+  MakeClip("in.mp4", 160, 120, 40);
+  const auto drawn = [this](const std::string& flags) {
+    RunWell("stabilize in.mp4 - --quiet " + flags + " >out.y4m");
+    return Content("out.y4m");
+  };
+  const std::string fresh = drawn("");
+  RunWell("analyze in.mp4 --project p.calm --quiet --smoothness 5 --framing synthesize-edges");
+  const std::string same = " --smoothness 50 --framing crop-auto-scale";
+  EXPECT_TRUE(drawn("--project p.calm" + same) == fresh);
+  RunWell("analyze in.mp4 --project p.calm --quiet --framing stabilize-only");
+  EXPECT_TRUE(drawn("--project p.calm" + same) == fresh);
+}
+
 // The next run of saved work doesn't decode the clip to number its frames, but says the same of it.
 TEST_F(ProgramTest, ADamagedClipIsToldOfInEveryRun) {
   MakeClip("whole.avi", 160, 120, 40);
