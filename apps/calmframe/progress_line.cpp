@@ -70,7 +70,7 @@ std::string ProgressText(const Progress& progress, double elapsed_seconds) {
   }
   if (progress.ends) {
     add("  in %s", Clock(elapsed_seconds).c_str());
-  } else if (share > 0.0 && share < 1.0) {
+  } else if (!progress.lasts && share > 0.0 && share < 1.0) {
     add("  %s left", Clock(elapsed_seconds * (1 - share) / share).c_str());
   }
   return text;
@@ -107,7 +107,8 @@ void ProgressLine::Show(const Progress& progress) {
   }
   constexpr std::chrono::milliseconds kBetween(100);  // faster than that nobody reads
   const bool flows = terminal_ || form_ == Form::json;
-  if (!begins && !progress.ends && (!flows || now - last_shown_ < kBetween)) return;
+  const bool is_due = flows && (progress.lasts || now - last_shown_ >= kBetween);
+  if (!begins && !progress.ends && !is_due) return;
   last_shown_ = now;
   const double elapsed = std::chrono::duration<double>(now - stage_begin_).count();
   if (form_ == Form::json) {

@@ -13,6 +13,7 @@ struct Progress {
   std::string unit;            // of both; empty for a mere share
   std::string says;            // what the effect shows its user meanwhile; may be empty
   bool ends = false;
+  bool lasts = false;  // nothing more may be told for a while
 };
 
 // Shows progress on the standard error: on a terminal one line that is written over, elsewhere a

@@ -71,8 +71,6 @@ void RenderCommand::Run() {
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   CheckCrop(*clip, progress);
   RenderClip(*clip, range, {.depth = flags_.depth, .threads = run_.threads}, *writer, progress);
-  writer->Finish();
-  for (const std::string& line : writer->warnings()) progress.Warn(line);
   unsaved.Throw();
 }
 

@@ -170,7 +170,8 @@ void MakeRoomForNeighbours(SteadyClip& clip, int depth, int threads) {
 
 void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
                   const std::string& stage, ProgressLine& progress,
-                  const std::function<void(std::size_t, const host::WorldBuffer&)>& take) {
+                  const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
+                  const std::function<void()>& finish) {
   RenderSettings own = settings;
   if (own.depth == 0) own.depth = clip.info().bit_depth > 8 ? 16 : 8;
   if (own.threads == 0) {
@@ -188,6 +189,13 @@ void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSetting
     take(frame, *frames.Take(static_cast<std::int64_t>(frame)));
   }
   clip.CheckMedia();
+  if (finish) {
+    shown.says = "encoding the last frames";
+    shown.lasts = true;
+    progress.Show(shown);
+    finish();
+    shown.says.clear();
+  }
   shown.done = shown.total;
   shown.ends = true;
   progress.Show(shown);
@@ -195,10 +203,13 @@ void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSetting
 
 void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
                 media::ClipWriter& writer, ProgressLine& progress) {
-  RenderFrames(clip, range, settings, "rendering", progress,
-               [&](std::size_t frame, const host::WorldBuffer& pixels) {
-                 Write(writer, frame - range.first, pixels);
-               });
+  RenderFrames(
+      clip, range, settings, "rendering", progress,
+      [&](std::size_t frame, const host::WorldBuffer& pixels) {
+        Write(writer, frame - range.first, pixels);
+      },
+      [&writer] { writer.Finish(); });
+  for (const std::string& line : writer.warnings()) progress.Warn(line);
 }
 
 }  // namespace calmframe

@@ -26,13 +26,15 @@ struct RenderSettings {
 };
 
 // Renders a solved clip's frames, several at a time, and gives them out in order, with their number
-// in the clip. `stage`: what the progress is called. Throws Interrupted, SolveFailure,
-// media::Failure, and what `take` throws.
+// in the clip. `stage`: what the progress is called; it has not ended before finish(), if there is
+// such, has. Throws Interrupted, SolveFailure, media::Failure, and what `take` and `finish` throw.
 void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
                   const std::string& stage, ProgressLine& progress,
-                  const std::function<void(std::size_t, const host::WorldBuffer&)>& take);
+                  const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
+                  const std::function<void()>& finish = {});
 
-// The same into a file: frames are counted from the range's first.
+// The same into a file, which is then whole: frames are counted from the range's first. The
+// writer's warnings are told.
 void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
                 media::ClipWriter& writer, ProgressLine& progress);
 

@@ -125,8 +125,6 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
     CheckCrop(*clip, progress);
     RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
                progress);
-    writer->Finish();
-    for (const std::string& line : writer->warnings()) progress.Warn(line);
     unsaved.Throw();
   });
 }

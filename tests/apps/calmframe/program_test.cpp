@@ -243,6 +243,9 @@ TEST_F(ProgramTest, JsonTellsHowFarEachStageIsAndHowItEnded) {
       EXPECT_GT(of[of.size() - 2]["done"], 0);
     }
   }
+  // What the encoder still holds is written before all is said to be done.
+  const std::vector<nlohmann::json>& rendering = shown["rendering"];
+  EXPECT_EQ(rendering.at(rendering.size() - 2).value("says", ""), "encoding the last frames");
   const Outcome failed = Run("stabilize missing.mp4 out2.mp4 --json");
   EXPECT_EQ(failed.code, 3);
   EXPECT_EQ(nlohmann::json::parse(failed.text)["exit_code"], 3);
@@ -323,8 +326,8 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   // The old file stays where the new one can't be written whole, or at all.
   const std::string tracks = Content("t.trk");
   for (const char* blocks : {"100", "0"}) {
-    const Outcome cut = Run("tracks away/work.calm t.trk --overwrite",
-                            std::string("ulimit -f ") + blocks + "; ");
+    const Outcome cut =
+        Run("tracks away/work.calm t.trk --overwrite", std::string("ulimit -f ") + blocks + "; ");
     EXPECT_EQ(cut.code, 4) << blocks;
     ExpectOneLine(cut, "t.trk: can't be written whole");
     EXPECT_TRUE(Content("t.trk") == tracks) << blocks;
