@@ -15,6 +15,7 @@
 
 #include "apps/calmframe/failures.h"
 #include "host/effects/renderer.h"
+#include "platform/hx/hx_controls.h"
 
 namespace calmframe {
 namespace {
@@ -144,14 +145,22 @@ void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer
   }
 }
 
+bool SynthesizesEdges(const SteadyClip& clip) {
+  return clip.ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
+}
+
+// The least that holds the source. Layers of soft edges, one on the other, add up the rounding of
+// each: 8 bits leave a dark rim.
+int DepthFor(const SteadyClip& clip) {
+  return clip.info().bit_depth > 8 || SynthesizesEdges(clip) ? 16 : 8;
+}
+
 // Frames on either side that a render looks at.
-double NeighboursOf(SteadyClip& clip) {
-  constexpr std::int32_t kFraming = 22, kSynthesisInputRange = 38;  // disk ids
-  constexpr double kSynthesizeEdges = 4;
+double NeighboursOf(const SteadyClip& clip) {
   const media::Ratio rate = clip.info().frame_rate;
-  return clip.ValueOf(kFraming) == kSynthesizeEdges
-             ? std::round(clip.ValueOf(kSynthesisInputRange) * static_cast<double>(rate.num) /
-                          static_cast<double>(rate.den))
+  return SynthesizesEdges(clip)
+             ? std::round(clip.ValueOf(HX_SYNTHESIS_INPUT_RANGE.disk_id) *
+                          static_cast<double>(rate.num) / static_cast<double>(rate.den))
              : 0.0;
 }
 
@@ -173,7 +182,7 @@ void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSetting
                   const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
                   const std::function<void()>& finish) {
   RenderSettings own = settings;
-  if (own.depth == 0) own.depth = clip.info().bit_depth > 8 ? 16 : 8;
+  if (own.depth == 0) own.depth = DepthFor(clip);
   if (own.threads == 0) {
     own.threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
   }

@@ -16,9 +16,9 @@ struct FrameRange {
   std::size_t first = 0, end = 0;
 };
 
-// depth: 8, 16 or 32 (float) bits of a component, 0 the least that holds the source. downsample: a
-// side is drawn with one pixel in so many. threads: frames in work at once, 0 as many as there are
-// processors.
+// depth: 8, 16 or 32 (float) bits of a component, 0 what the source and its framing need.
+// downsample: a side is drawn with one pixel in so many. threads: frames in work at once, 0 as many
+// as there are processors.
 struct RenderSettings {
   int depth = 0;
   int downsample = 1;

@@ -103,7 +103,8 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
   CLI::Option* const depth = AddChoice(
       command, "--depth", [&flags](const std::string& bits) { flags.depth = std::stoi(bits); },
       {"8", "16", "32"},
-      "Bits of a component while frames are drawn; at first 8, or 16 for deeper clips");
+      "Bits of a component while frames are drawn; at first 8, or 16 for deeper clips and for "
+      "synthesize-edges");
   CLI::Option* const overwrite =
       AddSwitch(command, "--overwrite", flags.encode.overwrite, "Replace OUT where it exists");
   PutInGroup("Output", {crf, codec, pixel_format, depth, overwrite});

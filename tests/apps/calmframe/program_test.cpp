@@ -70,6 +70,12 @@ TEST_F(ProgramTest, ADeepClipIsDrawnDeep) {
   EXPECT_THAT(deep.substr(0, deep.find('\n')), HasSubstr("p10"));
   EXPECT_TRUE(drawn("--depth 16") == deep);
   EXPECT_FALSE(drawn("--depth 8") == deep);
+  // Soft edges are laid over each other at 16 bits, of an 8-bit clip too.
+  fs::remove(Path("in.mkv"));
+  MakeWall("in.mkv", Made(160, 120, 10, 25), AlongTheWall);
+  const std::string filled = drawn("--framing synthesize-edges");
+  EXPECT_TRUE(drawn("--framing synthesize-edges --depth 16") == filled);
+  EXPECT_FALSE(drawn("--framing synthesize-edges --depth 8") == filled);
 }
 
 TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
