@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
@@ -14,6 +15,7 @@ class AnalyzeCommand final : public Command {
  public:
   explicit AnalyzeCommand(CLI::App& program);
   bool json() const override { return run_.json; }
+  std::vector<std::string> Kept() const override { return {project_}; }
   void Run() override;
 
  private:

@@ -1,5 +1,8 @@
 #pragma once
 
+#include <string>
+#include <vector>
+
 #include "apps/calmframe/flags.h"
 
 namespace calmframe {
@@ -15,6 +18,9 @@ class Command {
   const CLI::App& parser() const { return parser_; }
   // Whether it tells failures as JSON objects.
   virtual bool json() const { return false; }
+  // Files that stand whatever ends it: what is saved, and results that are whole. Empty names stand
+  // for none; not all need be there.
+  virtual std::vector<std::string> Kept() const { return {}; }
   // Throws what the program has an exit code for; see failures.h.
   virtual void Run() = 0;
 

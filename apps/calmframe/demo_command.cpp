@@ -126,6 +126,11 @@ DemoCommand::DemoCommand(CLI::App& program)
   AddRunFlags(parser_, run_);
 }
 
+std::vector<std::string> DemoCommand::Kept() const {
+  const std::filesystem::path directory(directory_);
+  return {directory / "shaky.mp4", directory / "steady.mp4", directory / "side-by-side.mp4"};
+}
+
 void DemoCommand::Run() {
   ProgressLine progress(run_.progress_form());
   std::error_code error;
@@ -133,10 +138,8 @@ void DemoCommand::Run() {
   if (error) {
     throw media::Failure(media::Failure::Side::output, directory_ + ": " + error.message());
   }
-  const std::filesystem::path directory(directory_);
-  const std::string shaky = directory / "shaky.mp4";
-  const std::string steady = directory / "steady.mp4";
-  const std::string both = directory / "side-by-side.mp4";
+  const std::vector<std::string> files = Kept();
+  const std::string &shaky = files[0], &steady = files[1], &both = files[2];
   OutputFlags flags = flags_;
   flags.encode = Encoding(flags_.encode);
 

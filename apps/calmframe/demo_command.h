@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/stabilize_command.h"
@@ -13,6 +14,7 @@ class DemoCommand final : public Command {
  public:
   explicit DemoCommand(CLI::App& program);
   bool json() const override { return run_.json; }
+  std::vector<std::string> Kept() const override;
   void Run() override;
 
  private:

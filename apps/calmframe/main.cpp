@@ -80,6 +80,16 @@ int Fail(ExitCode code, const std::string& line, bool json = false) {
   return code;
 }
 
+std::string KeptText(const Command& command) {
+  std::string kept;
+  for (const std::string& file : command.Kept()) {
+    std::error_code ignored;
+    if (!file.empty() && std::filesystem::exists(file, ignored)) kept += ", " + file;
+  }
+  if (kept.empty()) return "no output was left behind";
+  return "kept:" + kept.substr(1) + "; no other output was left behind";
+}
+
 int FailUsage(const CLI::App& program, const CLI::ParseError& error, int argc, char** argv) {
   std::string line = error.what();
   std::replace(line.begin(), line.end(), '\n', ' ');
@@ -192,7 +202,7 @@ int Run(int argc, char** argv) {
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);
   } catch (const Interrupted&) {
-    return Fail(kInterrupted, "interrupted; no output was left behind", json);
+    return Fail(kInterrupted, "interrupted; " + KeptText(command), json);
   } catch (const media::Failure& failure) {
     return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what(),
                 json);

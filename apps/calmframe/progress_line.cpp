@@ -39,6 +39,8 @@ double ShareOf(const Progress& progress) {
 void CatchInterrupts() {
   std::signal(SIGINT, OnInterrupt);
   std::signal(SIGTERM, OnInterrupt);
+  // nohup wants the program to go on.
+  if (std::signal(SIGHUP, OnInterrupt) == SIG_IGN) std::signal(SIGHUP, SIG_IGN);
 }
 
 bool InterruptAsked() {

@@ -54,8 +54,8 @@ std::string ProgressText(const Progress& progress, double elapsed_seconds);
 // of "share" (0 to 1), "done", "total", "unit", "says".
 std::string ProgressJson(const Progress& progress, double elapsed_seconds);
 
-// From now on the first Ctrl-C (or SIGTERM) asks the running stage to end; a second one ends the
-// program at once.
+// From now on the first Ctrl-C (or SIGTERM, or the terminal's end) asks the running stage to end; a
+// second one ends the program at once.
 void CatchInterrupts();
 bool InterruptAsked();
 

@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <string>
+#include <vector>
 
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/stabilize_command.h"
@@ -13,6 +14,7 @@ class RenderCommand final : public Command {
  public:
   explicit RenderCommand(CLI::App& program);
   bool json() const override { return run_.json; }
+  std::vector<std::string> Kept() const override { return {project_}; }
   void Run() override;
 
  private:

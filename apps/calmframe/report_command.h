@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/stabilize_command.h"
@@ -12,6 +13,7 @@ class ReportCommand final : public Command {
  public:
   explicit ReportCommand(CLI::App& program);
   bool json() const override { return run_.json; }
+  std::vector<std::string> Kept() const override { return {project_}; }
   void Run() override;
 
  private:

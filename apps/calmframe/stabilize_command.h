@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
@@ -52,6 +53,7 @@ class StabilizeCommand final : public Command {
  public:
   explicit StabilizeCommand(CLI::App& program);
   bool json() const override { return run_.json; }
+  std::vector<std::string> Kept() const override { return {project_}; }
   void Run() override;
 
  private:

@@ -409,15 +409,17 @@ TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
   MakeClip("in.mp4", 160, 120, 60);
   RunWell("analyze in.mp4 --project p.calm --framing synthesize-edges --quiet");
   const struct {
-    const char *stage, *run, *signal;
-  } cases[] = {{"analyzing", "stabilize in.mp4 out.mp4 --detailed-analysis", "INT"},
-               {"rendering", "render --project p.calm out.mp4", "TERM"}};
+    const char *stage, *run, *signal, *left;
+  } cases[] = {
+      {"analyzing", "stabilize in.mp4 out.mp4 --detailed-analysis", "INT", "no output was left"},
+      {"analyzing", "stabilize in.mp4 out.mp4 --project new.calm --detailed-analysis", "HUP",
+       "no output was left"},
+      {"rendering", "render --project p.calm out.mp4", "TERM", "kept: p.calm; no other output"}};
   for (const auto& c : cases) {
     const Outcome outcome = Run(std::string(c.run) + " 2>log & until grep -qs " + c.stage +
                                 " log; do :; done; kill -" + c.signal + " $!; wait $!");
     EXPECT_EQ(outcome.code, 130) << c.stage;
-    EXPECT_THAT(Content("log"),
-                ::testing::EndsWith("\ncalmframe: interrupted; no output was left behind\n"));
+    EXPECT_THAT(Content("log"), HasSubstr("\ncalmframe: interrupted; " + std::string(c.left)));
     EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "log", "p.calm"));
     fs::remove(Path("log"));
   }
