@@ -1,6 +1,7 @@
 #include "host/media/output_file.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -18,6 +19,36 @@ namespace {
 
 [[noreturn]] void Fail(const std::string& path, const std::string& cause) {
   throw Failure(Failure::Side::output, path + ": " + cause);
+}
+
+constexpr char kPrefix[] = ".calmframe-";
+constexpr char kSuffix[] = ".part";
+
+// What a program that was killed has left in the folder: who writes holds a lock on its file, which
+// ends with it.
+void Sweep(const std::filesystem::path& folder) {
+  std::error_code error;
+  for (std::filesystem::directory_iterator entry(folder.empty() ? "." : folder, error), end;
+       !error && entry != end; entry.increment(error)) {
+    const std::string name = entry->path().filename().string();
+    if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix)) continue;
+    const int file = open(entry->path().c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+    if (file < 0) continue;
+    if (flock(file, LOCK_EX | LOCK_NB) == 0) unlink(entry->path().c_str());
+    close(file);
+  }
+}
+
+// The file's descriptor where nobody has swept it between its making and its locking; else -1.
+int Locked(int file) {
+  if (file < 0) return -1;
+  struct stat status;
+  while (flock(file, LOCK_EX) != 0 && errno == EINTR) {  // other errors: without locks no sweep
+  }
+  if (fstat(file, &status) == 0 && status.st_nlink > 0) return file;
+  close(file);
+  errno = EEXIST;  // another name, then
+  return -1;
 }
 
 }  // namespace
@@ -43,24 +74,24 @@ OutputFile::OutputFile(const std::string& path, const std::string& source, bool 
   // A name of its own length, so that a long final name leaves room for it.
   static std::atomic<unsigned> serial = 0;
   const std::filesystem::path folder = std::filesystem::path(path_).parent_path();
-  int file = -1;
+  Sweep(folder);
   do {
-    temporary_ = (folder / (".calmframe-" + std::to_string(getpid()) + "-" +
-                            std::to_string(serial++) + ".part"))
-                     .string();
-    file = open(temporary_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
-  } while (file < 0 && errno == EEXIST);
-  if (file < 0) {
+    temporary_ =
+        (folder / (kPrefix + std::to_string(getpid()) + "-" + std::to_string(serial++) + kSuffix))
+            .string();
+    lock_ = Locked(open(temporary_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666));
+  } while (lock_ < 0 && errno == EEXIST);
+  if (lock_ < 0) {
     const int error = errno;
     temporary_.clear();
     Fail(path, "can't be written: " + (error == ENOENT ? "there is no folder " + folder.string()
                                                        : std::string(std::strerror(error))));
   }
-  close(file);
 }
 
 OutputFile::~OutputFile() {
   if (!temporary_.empty()) unlink(temporary_.c_str());
+  close(lock_);
 }
 
 void OutputFile::Commit() {

@@ -5,7 +5,8 @@
 namespace calmframe::media {
 
 // A file that gets its name only when it is whole: written under another name in the same folder,
-// which is removed unless Commit succeeds.
+// which is removed unless Commit succeeds. What programs that were killed have left in the folder
+// is removed too.
 class OutputFile {
  public:
   // Throws Failure (output): `path` exists and overwrite is off, is `source` under any name, is
@@ -24,6 +25,7 @@ class OutputFile {
   const bool overwrite_;
   std::string path_;  // links followed
   std::string temporary_;
+  int lock_ = -1;  // a descriptor of it, whose lock tells that it is being written
 };
 
 }  // namespace calmframe::media

@@ -425,6 +425,21 @@ TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
   }
 }
 
+TEST_F(ProgramTest, WhatAKilledRunLeftIsSweptAndWhatARunningOneWritesIsNot) {
+  MakeClip("in.mp4", 160, 120, 60);
+  const std::string rendering = " 2>log & until grep -qs rendering log; do :; done; ";
+  const std::string run =
+      "stabilize in.mp4 out.mp4 --synthesis-input-range 2 "
+      "--framing synthesize-edges";
+  Run(run + rendering + "kill -KILL $!; wait $!");
+  const std::set<std::string> killed = Files();
+  EXPECT_EQ(killed.size(), 3u);
+  EXPECT_EQ(
+      Run(run + rendering + CALMFRAME_PROGRAM " stabilize in.mp4 other.mp4 --quiet; wait $!").code,
+      0);
+  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "log", "other.mp4", "out.mp4"));
+}
+
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)  // these need all of it
 TEST_F(ProgramTest, WithoutMemoryItEndsInOneLineAndLeavesNothing) {
   MakeClip("in.mp4", 96, 64, 6);
