@@ -84,10 +84,10 @@ InfoCommand::InfoCommand(CLI::App& program)
 }
 
 void InfoCommand::Run() {
-  const host::Project project = host::LoadProject(project_);
+  host::Project project = host::LoadProject(project_);
   std::string clip, trouble;
   try {
-    clip = host::FindClip(project_, project);
+    clip = FindMovedClip(project_, project);
   } catch (const host::ProjectFailure& failure) {
     trouble = failure.what();
   }

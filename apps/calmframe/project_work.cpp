@@ -6,6 +6,25 @@
 #include "host/timeline/source.h"
 
 namespace calmframe {
+namespace {
+
+// Where the clip lies by now. A project that may not be written is found by its old places again.
+void KeepPlace(const std::string& path, const std::string& clip, host::Project& project) {
+  std::error_code error;
+  const std::filesystem::path place = std::filesystem::canonical(clip, error);
+  const std::filesystem::path folder = std::filesystem::canonical(path, error).parent_path();
+  if (error ||
+      (place == project.clip_path && place.lexically_relative(folder) == project.clip_relative)) {
+    return;
+  }
+  project.clip_path = place;
+  try {
+    host::SaveProject(path, project);
+  } catch (const host::ProjectFailure&) {
+  }
+}
+
+}  // namespace
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
   PutInGroup(
@@ -23,17 +42,25 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
   if (project.empty() || !std::filesystem::exists(project, error)) {
     return std::make_unique<SteadyClip>(clip, controls, opening);
   }
-  const host::Project saved = host::LoadProject(project);
+  host::Project saved = host::LoadProject(project);
   if (host::ContentOf(clip) != saved.clip_content) {
     throw media::Failure(media::Failure::Side::input,
                          project + ": is of another clip, " + saved.clip_path);
   }
+  KeepPlace(project, clip, saved);
   return std::make_unique<SteadyClip>(saved, clip, controls);
 }
 
+std::string FindMovedClip(const std::string& path, host::Project& project) {
+  const std::string clip = host::FindClip(path, project);
+  KeepPlace(path, clip, project);
+  return clip;
+}
+
 std::unique_ptr<SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
-  const host::Project project = host::LoadProject(path);
-  return std::make_unique<SteadyClip>(project, host::FindClip(path, project), controls);
+  host::Project project = host::LoadProject(path);
+  const std::string clip = FindMovedClip(path, project);
+  return std::make_unique<SteadyClip>(project, clip, controls);
 }
 
 void KeepApart(const std::string& output, const std::vector<std::string>& inputs) {

@@ -31,6 +31,10 @@ void RunOnPromises(const Run& run) {
   run(Opening::decoded);
 }
 
+// Where the clip of saved work lies, which the work's file knows from now on. Throws as
+// host::FindClip.
+std::string FindMovedClip(const std::string& path, host::Project& project);
+
 // The clip of saved work, found by its name or beside it. Throws media::Failure,
 // host::ProjectFailure.
 std::unique_ptr<SteadyClip> OpenSaved(const std::string& project,

@@ -153,10 +153,10 @@ std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
 std::unique_ptr<SteadyClip> OpenForReport(const std::string& path, std::string* gone) {
   ControlFlags controls;
   controls.experimental = true;  // tracks and the solve's log are for experts
-  const host::Project project = host::LoadProject(path);
+  host::Project project = host::LoadProject(path);
   std::string clip;
   try {
-    clip = host::FindClip(path, project);
+    clip = FindMovedClip(path, project);
   } catch (const host::ProjectFailure& failure) {
     *gone = failure.what();
     return std::make_unique<SteadyClip>(project, controls);

@@ -324,6 +324,16 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
     return nlohmann::json::parse(Run("info away/work.calm --json").text).at("fits").get<bool>();
   };
   EXPECT_TRUE(fits());
+  // From then on it is known where the clip is, though the project alone moves on; and so it is
+  // where the user tells it.
+  fs::rename(Path("away/work.calm"), Path("moved.calm"));
+  EXPECT_THAT(Run("info moved.calm").text, HasSubstr("away/in.mp4: 40 frames"));
+  fs::rename(Path("away/in.mp4"), Path("away/named.mp4"));
+  RunWell("analyze away/named.mp4 --project moved.calm");
+  EXPECT_THAT(Run("info moved.calm").text, HasSubstr("away/named.mp4: 40 frames"));
+  fs::rename(Path("away/named.mp4"), Path("away/in.mp4"));
+  fs::rename(Path("moved.calm"), Path("away/work.calm"));
+  RunWell("analyze away/in.mp4 --project away/work.calm");
   RunWell("tracks away/work.calm t.trk");
   EXPECT_EQ(fs::file_size(Path("t.trk")), 20u + 2000 * 40 * 16);
   EXPECT_EQ(Run("tracks away/work.calm away/work.calm").code, 4);  // nothing is written over
