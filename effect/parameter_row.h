@@ -66,11 +66,11 @@ constexpr ParameterRow SliderRow(std::int32_t disk_id, ParameterText name, Param
           slider,  default_value,         format, flags, ui_flags};
 }
 constexpr ParameterRow SliderRow(const HX_SliderControl& control, ParameterText name,
-                                 ParameterRange slider, ParameterFormat format,
-                                 std::uint32_t flags) {
+                                 ParameterRange slider, ParameterFormat format, std::uint32_t flags,
+                                 std::uint32_t ui_flags = 0) {
   return SliderRow(control.disk_id, name,
                    {static_cast<float>(control.min), static_cast<float>(control.max)}, slider,
-                   control.default_value, format, flags);
+                   control.default_value, format, flags, ui_flags);
 }
 constexpr ParameterRow PopupRow(const HX_PopupControl& control, ParameterText name,
                                 ParameterText items, std::uint32_t flags) {

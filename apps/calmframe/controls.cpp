@@ -10,9 +10,7 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
-#include "apps/calmframe/plugin_path.h"
 #include "host/base/nearest_match.h"
-#include "host/effects/host.h"
 #include "platform/hx/hx_controls.h"
 #include "platform/tessel/debug.h"
 
@@ -212,12 +210,19 @@ bool HasFlag(std::int32_t disk_id) {
                      [disk_id](const Flag& flag) { return DiskIdOf(flag) == disk_id; });
 }
 
-void ShowExperimentalParameters(const ControlFlags& flags) {
+void DeclareExperimentalParameters() {
   constexpr char kOption[] = "ShowExperimentalEffectParameters";
-  if (!flags.experimental || tessel::debug::DebugDatabase::GetBool(kOption)) return;
+  if (tessel::debug::DebugDatabase::GetBool(kOption)) return;
   tessel::debug::DebugDatabase::Set(kOption, 1);
   // The solve's log comes with the option; who wants that sets it in the environment.
   tessel::debug::SetSink([](const std::string&) {});
+}
+
+std::vector<HX_ParamDef> OfferedParams(const ControlFlags& flags,
+                                       const std::vector<HX_ParamDef>& declared) {
+  const std::size_t count = flags.experimental ? declared.size() : HX_FIRST_EXPERIMENTAL;
+  return {declared.begin(),
+          declared.begin() + static_cast<std::ptrdiff_t>(std::min(count, declared.size()))};
 }
 
 std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,
@@ -235,21 +240,15 @@ std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,
       throw UsageFailure("--param takes NAME=VALUE, not '" + setting + "'");
     }
     if (!param) {
-      const std::string name = setting.substr(0, last);
-      throw UnknownParam(name, UnknownText(name, declared));
+      throw UsageFailure(UnknownText(setting.substr(0, last), OfferedParams(flags, declared)));
+    }
+    if (!flags.experimental && param - declared.data() >= HX_FIRST_EXPERIMENTAL) {
+      throw UsageFailure("--param " + std::string(param->name) +
+                         ": is experimental, which takes --experimental");
     }
     values[param->disk_id] = ParseValue(*param, setting.substr(sign + 1));
   }
   return values;
-}
-
-void ThrowIfExperimental(const UnknownParam& unknown) {
-  ControlFlags controls;
-  controls.experimental = true;
-  ShowExperimentalParameters(controls);
-  const host::Host host(PluginPath());
-  if (!FindParam(unknown.name, host.declarations())) return;
-  throw UsageFailure("--param " + unknown.name + ": is experimental, which takes --experimental");
 }
 
 }  // namespace calmframe

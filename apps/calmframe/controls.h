@@ -3,10 +3,8 @@
 #include <cstdint>
 #include <map>
 #include <string>
-#include <utility>
 #include <vector>
 
-#include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "platform/hx/hx_params.h"
 
@@ -23,7 +21,7 @@ inline bool Crops(double framing) {
 struct ControlFlags {
   std::map<std::int32_t, double> values;  // of the controls with a flag, by disk id; those given
   std::vector<std::string> params;        // "NAME=VALUE" of any parameter
-  bool experimental = false;              // the effect declares its experimental parameters too
+  bool experimental = false;              // `params` may name experimental ones
 };
 
 // Adds a flag for each of the user's controls, by the control's name, --param and --experimental.
@@ -33,24 +31,16 @@ void AddControlFlags(CLI::App& command, ControlFlags& flags);
 bool HasFlag(std::int32_t disk_id);
 
 // To be called before the effect is loaded: whether it declares its experimental parameters is
-// settled then.
-void ShowExperimentalParameters(const ControlFlags& flags);
+// settled then. The program sets some of them by itself, whatever it offers.
+void DeclareExperimentalParameters();
 
-// --param names a parameter that the effect doesn't declare.
-class UnknownParam : public UsageFailure {
- public:
-  UnknownParam(std::string unknown, const std::string& line)
-      : UsageFailure(line), name(std::move(unknown)) {}
-  const std::string name;
-};
+// The parameters that are offered, of all that the effect declares.
+std::vector<HX_ParamDef> OfferedParams(const ControlFlags& flags,
+                                       const std::vector<HX_ParamDef>& declared);
 
-// Values by disk id, all of them valid, later ones of one parameter counting. `declared`: the
-// effect's parameters. Throws UsageFailure; UnknownParam, with the nearest name.
+// Values by disk id, all of them valid, later ones of one parameter counting. `declared`: all of
+// the effect's parameters. Throws UsageFailure, with the nearest name for an unknown one.
 std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,
                                                const std::vector<HX_ParamDef>& declared);
-
-// Throws UsageFailure where the parameter is there once --experimental is given. Loads the effect
-// anew, which its host must have let go.
-void ThrowIfExperimental(const UnknownParam& unknown);
 
 }  // namespace calmframe

@@ -61,14 +61,14 @@ ParamsCommand::ParamsCommand(CLI::App& program)
 }
 
 void ParamsCommand::Run() {
-  ShowExperimentalParameters(controls_);
+  DeclareExperimentalParameters();
   std::vector<HX_ParamDef> params;
   nlohmann::ordered_json list = nlohmann::ordered_json::array();
   try {
     const host::Host host(PluginPath());
     std::map<std::int32_t, double> given = ResolveControls(controls_, host.declarations());
     if (!project_.empty()) given.merge(host::LoadProject(project_).effect.values);
-    for (const HX_ParamDef& param : host.declarations()) {
+    for (const HX_ParamDef& param : OfferedParams(controls_, host.declarations())) {
       if (!IsControl(param)) continue;
       const auto found = given.find(param.disk_id);
       const double value = found == given.end() ? DefaultOf(param) : found->second;
@@ -81,9 +81,6 @@ void ParamsCommand::Run() {
       if (IsChanged(param, value)) std::printf(", now %s", ValueText(param, value).c_str());
       std::printf("\n");
     }
-  } catch (const UnknownParam& unknown) {
-    ThrowIfExperimental(unknown);
-    throw;
   } catch (const host::PluginError& error) {
     throw SolveFailure(error.what());
   }

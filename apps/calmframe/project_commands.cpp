@@ -125,9 +125,7 @@ TracksCommand::TracksCommand(CLI::App& program)
 
 void TracksCommand::Run() {
   media::OutputFile file(output_, project_, overwrite_);
-  ControlFlags controls;
-  controls.experimental = true;  // the button is one for experts
-  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_, controls);
+  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_);
   KeepApart(output_, {clip->path()});
   SaveTracks(*clip, project_, file.temporary(), output_);
   file.Commit();

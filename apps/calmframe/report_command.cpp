@@ -151,17 +151,15 @@ std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
 
 // The clip of saved work, or where that is gone a stand-in for it, and a line that says so.
 std::unique_ptr<SteadyClip> OpenForReport(const std::string& path, std::string* gone) {
-  ControlFlags controls;
-  controls.experimental = true;  // tracks and the solve's log are for experts
   host::Project project = host::LoadProject(path);
   std::string clip;
   try {
     clip = FindMovedClip(path, project);
   } catch (const host::ProjectFailure& failure) {
     *gone = failure.what();
-    return std::make_unique<SteadyClip>(project, controls);
+    return std::make_unique<SteadyClip>(project, ControlFlags());
   }
-  return std::make_unique<SteadyClip>(project, clip, controls);
+  return std::make_unique<SteadyClip>(project, clip, ControlFlags());
 }
 
 std::string NameOf(const std::string& path) {

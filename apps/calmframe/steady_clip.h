@@ -92,7 +92,8 @@ class SteadyClip {
   // The effect goes on from what it would save, which is rounded: so a clip looks the same whether
   // its work went through a project or not. Throws SolveFailure.
   void TakeAsSaved();
-  void SetFraming(double value);
+  // Of a parameter, as it was declared. Throws SolveFailure.
+  void Set(std::int32_t disk_id, double value);
   // Throws SolveFailure where the effect is not ready.
   void CheckResult(ProgressLine& progress);
   // Address of the first frame's warp, which goes with its solve; null without one.

@@ -43,6 +43,14 @@ HX_CONTROL HX_SliderControl HX_SYNTHESIS_INPUT_RANGE = {38, 0, 999, 0.5}; /* sec
 HX_CONTROL HX_SliderControl HX_SYNTHESIS_EDGE_FEATHER = {35, 0, 999, 10}; /* pixels */
 HX_CONTROL HX_CheckboxControl HX_HIDE_WARNING_BANNER = {26, 0};
 
+/* A parameter for experts, which is declared where the effect's experimental ones are. Pixels of a
+   picture 1000 wide; at its default all tracks are trusted alike. */
+HX_CONTROL HX_SliderControl HX_TRANSITION_BISQUARE_SIGMA = {285, 1, 10, 5};
+
+/* Index of the first experimental parameter of those that a loaded effect declares; the layer's is
+   0. */
+HX_CONTROL int32_t HX_FIRST_EXPERIMENTAL = 31;
+
 #undef HX_CONTROL
 
 #endif

@@ -11,7 +11,7 @@ namespace kelp::effect {
 
 inline constexpr std::int32_t kParamCount = 98;
 // From here on: declared only with the debug option "ShowExperimentalEffectParameters".
-inline constexpr std::int32_t kFirstExperimentalIndex = 31;
+inline constexpr std::int32_t kFirstExperimentalIndex = HX_FIRST_EXPERIMENTAL;
 inline constexpr std::int32_t kNoParam = -1;
 
 enum ParamIndex : std::int32_t {

@@ -198,12 +198,16 @@ TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {
   EXPECT_EQ(given, flags.size());
 }
 
-// Nothing was touched, so nothing is told to differ, and numbers are those that were declared.
+// Only what the program chooses is told to differ, and numbers are those that were declared.
 TEST_F(ProgramTest, SavedWorkHasTheValuesThatItWasGiven) {
   MakeClip("in.mp4", 64, 48, 5);
   RunWell("analyze in.mp4 --project p.calm --experimental --quiet");
   const std::string params = "params --experimental --project p.calm ";
-  EXPECT_THAT(RunWell(params), Not(HasSubstr(", now ")));
+  const std::string text = RunWell(params), differs = ", now ";
+  EXPECT_THAT(text, HasSubstr("1 to 10 (default 5), now 3\n"));
+  EXPECT_EQ(text.find(differs), text.rfind(differs)) << text;
+  RunWell("analyze in.mp4 --project q.calm --experimental --param \"transition bisquare sigma=5\"");
+  EXPECT_THAT(RunWell("params --experimental --project q.calm"), Not(HasSubstr(differs)));
   const std::string json = RunWell(params + "--json");
   for (const char* line : {"\"default\": 0.0045,", "\"value\": 0.0045\n", "\"min\": 0.001,"}) {
     EXPECT_THAT(json, HasSubstr(line));
