@@ -29,6 +29,24 @@ int SwscaleMatrix(AVColorSpace matrix) {
   }
 }
 
+// Its full-range twins have the same words, but swscale squeezes them whatever it is told.
+int WithoutRange(int format) {
+  switch (format) {
+    case AV_PIX_FMT_YUVJ411P:
+      return AV_PIX_FMT_YUV411P;
+    case AV_PIX_FMT_YUVJ420P:
+      return AV_PIX_FMT_YUV420P;
+    case AV_PIX_FMT_YUVJ422P:
+      return AV_PIX_FMT_YUV422P;
+    case AV_PIX_FMT_YUVJ440P:
+      return AV_PIX_FMT_YUV440P;
+    case AV_PIX_FMT_YUVJ444P:
+      return AV_PIX_FMT_YUV444P;
+    default:
+      return format;
+  }
+}
+
 const AVPixFmtDescriptor& LayoutOf(const AVFrame& frame) {
   return *NotNull(av_pix_fmt_desc_get(static_cast<AVPixelFormat>(frame.format)));
 }
@@ -69,6 +87,30 @@ std::uint16_t* Row16(const AVFrame& frame, int plane, int y) {
   return frame.data[plane]
              ? Row(reinterpret_cast<std::uint16_t*>(frame.data[plane]), frame.linesize[plane], y)
              : nullptr;
+}
+
+// A row of a YUV frame's alpha, its words shifted up to 16 bits as DeepYuv has them. swscale would
+// repeat their upper bits in the lower ones.
+void ReadAlpha(const AVFrame& frame, int y, std::uint16_t* words) {
+  const AVPixFmtDescriptor& layout = LayoutOf(frame);
+  const std::uint8_t* data[4] = {frame.data[0], frame.data[1], frame.data[2], frame.data[3]};
+  av_read_image_line2(words, data, frame.linesize, &layout, 0, y, 3, frame.width, 0, 2);
+  const int shift = 16 - layout.comp[3].depth;
+  for (int x = 0; x < frame.width; ++x) words[x] = static_cast<std::uint16_t>(words[x] << shift);
+}
+
+// The way back, into a plane of its own; rounds `words` to its depth.
+void WriteAlpha(std::uint16_t* words, int y, AVFrame& frame) {
+  const AVPixFmtDescriptor& layout = LayoutOf(frame);
+  const int shift = 16 - layout.comp[3].depth;
+  const int half = (1 << shift) / 2;
+  for (int x = 0; x < frame.width; ++x) {
+    words[x] = static_cast<std::uint16_t>((words[x] + half) >> shift);
+  }
+  // av_write_image_line2 sets bits and clears none.
+  std::uint8_t* const row = frame.data[3] + std::ptrdiff_t{y} * frame.linesize[3];
+  std::fill_n(row, static_cast<std::size_t>(layout.comp[3].step) * frame.width, std::uint8_t{0});
+  av_write_image_line2(words, frame.data, frame.linesize, &layout, 0, y, 3, frame.width, 2);
 }
 
 // RGB, palette and grey of any integer depth, read component by component, exactly.
@@ -182,10 +224,10 @@ void Scaler::ScalePart(const AVFrame& from, AVFrame& to, const ColourModel& mode
     };
     set("srcw", from.width);
     set("srch", from.height);
-    set("src_format", from.format);
+    set("src_format", WithoutRange(from.format));
     set("dstw", to.width);
     set("dsth", to.height);
-    set("dst_format", to.format);
+    set("dst_format", WithoutRange(to.format));
     set("sws_flags", SWS_BICUBIC | SWS_ACCURATE_RND | SWS_FULL_CHR_H_INT | SWS_FULL_CHR_H_INP);
     // Formats below 8 bits are dithered from row to row, which bands in parallel would break.
     const unsigned processors = std::clamp(std::thread::hardware_concurrency(), 1u, 4u);
@@ -195,10 +237,13 @@ void Scaler::ScalePart(const AVFrame& from, AVFrame& to, const ColourModel& mode
       const bool centred = model.chroma == AVCHROMA_LOC_CENTER ||
                            model.chroma == AVCHROMA_LOC_TOP || model.chroma == AVCHROMA_LOC_BOTTOM;
       const bool top = model.chroma == AVCHROMA_LOC_TOPLEFT || model.chroma == AVCHROMA_LOC_TOP;
+      const bool bottom =
+          model.chroma == AVCHROMA_LOC_BOTTOMLEFT || model.chroma == AVCHROMA_LOC_BOTTOM;
       // In 1/256 of a luma sample.
       const int w = layout.log2_chroma_w;
       if (w > 0) set(across, centred ? (128 << w) - 128 : 0);
-      if (layout.log2_chroma_h == 1) set(down, part == 1 ? 64 : part == 2 ? 192 : top ? 0 : 128);
+      if (layout.log2_chroma_h == 1)
+        set(down, part == 1 ? 64 : part == 2 ? 192 : top ? 0 : bottom ? 256 : 128);
     };
     position("src_h_chr_pos", "src_v_chr_pos", from);
     position("dst_h_chr_pos", "dst_v_chr_pos", to);
@@ -257,14 +302,15 @@ void FrameToPixels::ConvertStored(const AVFrame& frame, Pixel* pixels, std::ptrd
     scaler_.Scale(frame, planes, model);
     FromPlanes8(planes, alpha, pixels, row_bytes);
   } else {
-    AVFrame& planes = Reuse(planes_, alpha ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16,
-                            frame.width, frame.height);
+    AVFrame& planes = Reuse(planes_, AV_PIX_FMT_YUV444P16, frame.width, frame.height);
     scaler_.Scale(frame, planes, model);
     const DeepYuv yuv(model, layout.comp[0].depth);
+    std::vector<std::uint16_t> opacity(alpha ? static_cast<std::size_t>(frame.width) : 0);
     for (int y = 0; y < frame.height; ++y) {
-      yuv.ToPixels(
-          {Row16(planes, 0, y), Row16(planes, 1, y), Row16(planes, 2, y), Row16(planes, 3, y)},
-          static_cast<std::size_t>(frame.width), Row(pixels, row_bytes, y));
+      if (alpha) ReadAlpha(frame, y, opacity.data());
+      yuv.ToPixels({Row16(planes, 0, y), Row16(planes, 1, y), Row16(planes, 2, y),
+                    alpha ? opacity.data() : nullptr},
+                   static_cast<std::size_t>(frame.width), Row(pixels, row_bytes, y));
     }
   }
 }
@@ -361,15 +407,21 @@ FramePtr PixelsToFrame::Convert(const Pixel* pixels, std::ptrdiff_t row_bytes) {
     return frame;
   }
   if constexpr (!std::is_same_v<Pixel, HX_Pixel8>) {
+    // Alpha in a plane of its own is written here, other alpha by swscale.
+    const bool own_plane = alpha && layout.comp[3].plane == 3;
     AVFrame& planes =
-        Reuse(planes_, alpha ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16, width_, height_);
+        Reuse(planes_, alpha && !own_plane ? AV_PIX_FMT_YUVA444P16 : AV_PIX_FMT_YUV444P16, width_,
+              height_);
     const DeepYuv yuv(model_, std::min(layout.comp[0].depth, 16));
+    std::vector<std::uint16_t> words(own_plane ? static_cast<std::size_t>(width_ * height_) : 0);
+    const auto words_of = [&](int y) { return words.data() + std::ptrdiff_t{y} * width_; };
     for (int y = 0; y < height_; ++y) {
-      yuv.FromPixels(
-          Row(pixels, row_bytes, y), static_cast<std::size_t>(width_),
-          {Row16(planes, 0, y), Row16(planes, 1, y), Row16(planes, 2, y), Row16(planes, 3, y)});
+      yuv.FromPixels(Row(pixels, row_bytes, y), static_cast<std::size_t>(width_),
+                     {Row16(planes, 0, y), Row16(planes, 1, y), Row16(planes, 2, y),
+                      own_plane ? words_of(y) : Row16(planes, 3, y)});
     }
     scaler_.Scale(planes, *frame, model_);
+    for (int y = 0; own_plane && y < height_; ++y) WriteAlpha(words_of(y), y, *frame);
   }
   return frame;
 }
