@@ -21,7 +21,8 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
           "Examples:\n"
           "  calmframe analyze shaky.mp4\n"
           "  calmframe analyze shaky.mp4 --project shaky.calm --smoothness 20")) {
-  AddFile(parser_, "IN", input_, "The shaky clip");
+  AddFile(parser_, "IN", input_,
+          "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
   AddControlFlags(parser_, controls_);
   AddProjectFlag(parser_, project_);
   AddRunFlags(parser_, run_);

@@ -194,6 +194,9 @@ int Run(int argc, char** argv) {
   Command& command = **std::find_if(std::begin(commands), std::end(commands),
                                     [](const Command* one) { return one->parser().parsed(); });
   const bool json = command.json();
+  const auto interrupted = [&] {
+    return Fail(kInterrupted, "interrupted; " + KeptText(command), json);
+  };
   CatchInterrupts();
   std::signal(SIGXFSZ, SIG_IGN);  // a file that may not grow is one that can't be written
   try {
@@ -202,10 +205,11 @@ int Run(int argc, char** argv) {
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);
   } catch (const Interrupted&) {
-    return Fail(kInterrupted, "interrupted; " + KeptText(command), json);
+    return interrupted();
   } catch (const media::Failure& failure) {
-    return Fail(failure.side == media::Failure::Side::input ? kInput : kOutput, failure.what(),
-                json);
+    const bool input = failure.side == media::Failure::Side::input;
+    if (input && InterruptAsked()) return interrupted();  // while it waited for a pipe
+    return Fail(input ? kInput : kOutput, failure.what(), json);
   } catch (const host::ProjectFailure& failure) {
     return Fail(kInput, failure.what(), json);
   } catch (const SolveFailure& failure) {

@@ -144,7 +144,8 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
           "  calmframe stabilize shaky.mp4 steady.mp4\n"
           "  calmframe stabilize walk.mp4 calm.mp4 --smoothness 100\n"
           "  calmframe stabilize talk.mp4 still.mp4 --result no-motion")) {
-  AddFile(parser_, "IN", input_, "The shaky clip");
+  AddFile(parser_, "IN", input_,
+          "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
   AddFile(parser_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe");
   AddControlFlags(parser_, controls_);
   AddOutputFlags(parser_, flags_);

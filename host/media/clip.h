@@ -89,9 +89,9 @@ class FoundFrames {
 // Reads any frame of a clip's first video stream. For one thread at a time.
 class ClipReader {
  public:
-  // Opens the file and finds every frame, which costs decoding all of it. Not so where `found`
-  // tells what was found before in a file of the same contents; whatever else stands there, or
-  // comes from other libraries, counts for nothing. Throws Failure (input).
+  // Opens what FilesOf takes and finds every frame, which costs decoding all of it. Not so where
+  // `found` tells what was found before in a file of the same contents; whatever else stands there,
+  // or comes from other libraries, counts for nothing. Throws Failure (input).
   static std::unique_ptr<ClipReader> Open(const std::string& path,
                                           const std::vector<std::uint8_t>& found = {});
   // The same by the promises of its packets: whoever reads all frames in order anyhow, from the

@@ -7,7 +7,11 @@
 #include <cerrno>
 #include <cstdarg>
 #include <cstring>
+#include <fstream>
+#include <numeric>
 #include <string_view>
+
+#include "host/media/clip_files.h"
 
 namespace calmframe::media {
 namespace {
@@ -31,6 +35,29 @@ namespace {
 // Many damaged packets in a row end the stream: some demuxers return the same error for ever.
 constexpr int kErrorLimit = 1000;
 
+// Of an MP4 or MOV file: its "moov" box, which most recorders write last.
+bool LacksIndex(const std::string& file) {
+  std::ifstream in(file, std::ios::binary);
+  std::uint8_t head[8];
+  const auto number = [&head](std::size_t bytes) {  // big-endian
+    return std::accumulate(head, head + bytes, std::uint64_t{0},
+                           [](std::uint64_t sum, std::uint8_t byte) { return sum << 8 | byte; });
+  };
+  const auto read = [&] { return bool(in.read(reinterpret_cast<char*>(head), sizeof head)); };
+  bool is_movie = false;
+  for (std::uint64_t at = 0; in.seekg(static_cast<std::streamoff>(at));) {
+    if (!read()) break;
+    const std::string_view type(reinterpret_cast<const char*>(head) + 4, 4);
+    if (type == "moov") return false;
+    is_movie = is_movie || type == "ftyp" || type == "mdat";
+    std::uint64_t size = number(4);
+    if (size == 1 && read()) size = number(8);
+    if (size < 8 || size > INT64_MAX - at) break;
+    at += size;
+  }
+  return is_movie;
+}
+
 // Of a decoder of ours, on any of its threads: its context, or a copy of it, leads to the count.
 void CountComplaint(void* speaker, int level, const char*, va_list) {
   if (level > AV_LOG_INFO || !speaker) return;
@@ -48,18 +75,30 @@ void ListenToFfmpeg() {
 
 InputPtr OpenInput(const std::string& path) {
   ListenToFfmpeg();
+  const ClipFiles files = FilesOf(path);
+  const std::string& file = files.paths[0];
   struct stat status;
-  if (stat(path.c_str(), &status) != 0) Fail(path, std::strerror(errno));
-  if (S_ISDIR(status.st_mode)) Fail(path, "is a directory");
-  if (!S_ISREG(status.st_mode)) Fail(path, "is not a file on disk");
-  if (access(path.c_str(), R_OK) != 0) Fail(path, std::strerror(errno));
+  if (stat(file.c_str(), &status) != 0) Fail(path, std::strerror(errno));
+  if (access(file.c_str(), R_OK) != 0) Fail(path, std::strerror(errno));
   if (status.st_size == 0) Fail(path, "is empty");
 
   AVFormatContext* opened = nullptr;
   AVDictionary* options = nullptr;
   if (av_dict_set(&options, "protocol_whitelist", "file", 0) < 0) throw std::bad_alloc();
-  int error = avformat_open_input(&opened, ("file:" + path).c_str(), nullptr, &options);
+  const AVInputFormat* pictures = nullptr;
+  if (!files.pattern.empty()) {
+    pictures = av_find_input_format("image2");
+    av_dict_set(&options, "pattern_type", files.is_glob ? "glob" : "sequence", 0);
+    av_dict_set_int(&options, "start_number", files.first_number, 0);
+  }
+  const std::string url = pictures ? files.pattern : "file:" + file;
+  int error = avformat_open_input(&opened, url.c_str(), pictures, &options);
   av_dict_free(&options);
+  if (error < 0 && LacksIndex(file)) {
+    Fail(path,
+         "its index is missing, without which no frame is found: the recording or the copy "
+         "broke off before its end");
+  }
   if (error < 0) Fail(path, "not a video file, or damaged at its start", error);
   InputPtr container(opened);
   // Text is shown as pictures by this one.

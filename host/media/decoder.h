@@ -11,8 +11,8 @@ namespace calmframe::media {
 // More pixels than any camera's frame has, few enough for a frame of floats to fit in memory.
 constexpr std::int64_t kMaximumPixels = std::int64_t{1} << 27;
 
-// Opens a file for reading its packets. Only a plain file on disk is read, whatever its name looks
-// like or its contents point to. Throws Failure (input).
+// Opens a clip for reading its packets. Only what FilesOf tells of it is read, whatever its
+// contents point to. Throws Failure (input).
 InputPtr OpenInput(const std::string& path);
 
 // From now on FFmpeg prints nothing, and its decoders' complaints are counted. Any thread.

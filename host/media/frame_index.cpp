@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <optional>
+#include <string_view>
 
 namespace calmframe::media {
 namespace {
@@ -224,6 +225,13 @@ void FrameScan::Add(const AVFrame& frame) {
 ClipInfo FrameScan::Finish() {
   if (!first_) {
     throw Failure(Failure::Side::input, path_ + ": no frame of its video stream decodes");
+  }
+  const std::string_view kind = decoder_.container().iformat->name;
+  if (index_.size() == 1 && (kind == "image2" || kind.ends_with("_pipe"))) {
+    throw Failure(Failure::Side::input,
+                  path_ +
+                      ": one picture alone has no motion; more of them are named by f%04d.png, "
+                      "by a quoted glob, or by their folder");
   }
   ClipInfo info = InfoOf(path_, decoder_, std::move(times_), *first_, aspect_, fields_);
   const std::string damage = DamageLine(decoder_, index_.size());

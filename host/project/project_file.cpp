@@ -13,6 +13,7 @@
 #include <type_traits>
 #include <vector>
 
+#include "host/media/clip_files.h"
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
 
@@ -309,7 +310,7 @@ std::string FindClip(const std::string& path, const Project& project) {
   std::string changed;
   for (const fs::path& place : places) {
     std::error_code error;
-    if (!fs::is_regular_file(place, error)) continue;
+    if (!fs::is_regular_file(place, error) && !media::IsSequence(place)) continue;
     if (ContentOf(place) == project.clip_content) return place;
     if (changed.empty()) changed = place;
   }

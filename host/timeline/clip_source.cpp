@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "host/media/clip.h"
+#include "host/media/clip_files.h"
 #include "host/timeline/source.h"
 
 namespace calmframe::host {
@@ -163,9 +164,7 @@ class ClipSource final : public Source {
   std::deque<Recent> recent_;  // the oldest first
 };
 
-}  // namespace
-
-Guid ContentOf(const std::string& path) {
+Guid ContentOfFile(const std::string& path) {
   std::ifstream file(path, std::ios::binary);
   file.seekg(0, std::ios::end);
   const std::int64_t size = file.tellg();
@@ -177,6 +176,19 @@ Guid ContentOf(const std::string& path) {
     file.seekg(start);
     if (!file.read(bytes.data(), part)) Unreadable(path);
     guid = MixHash(guid, bytes.data(), static_cast<std::size_t>(part));
+  }
+  return guid;
+}
+
+}  // namespace
+
+Guid ContentOf(const std::string& path) {
+  const media::ClipFiles files = media::FilesOf(path);
+  if (files.pattern.empty()) return ContentOfFile(files.paths[0]);
+  Guid guid;
+  for (const std::string& picture : files.paths) {
+    const Guid content = ContentOfFile(picture);
+    guid = MixHash(guid, &content, sizeof content);
   }
   return guid;
 }

@@ -41,8 +41,8 @@ class Source {
 
 using SourcePtr = boost::shared_ptr<Source>;
 
-// Identity of a file's contents, from its size, its first and its last bytes: equal for copies
-// under any name. Throws media::Failure if it can't be read.
+// Identity of a clip's contents, from the sizes, the first and the last bytes of its files: equal
+// for copies under any name. Throws media::Failure if it can't be read.
 tessel::utility::Guid ContentOf(const std::string& path);
 
 // A video file. Throws media::Failure (a std::runtime_error, one line) if it can't be read.

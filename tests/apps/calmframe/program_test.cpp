@@ -78,6 +78,18 @@ TEST_F(ProgramTest, ADeepClipIsDrawnDeep) {
   EXPECT_FALSE(drawn("--framing synthesize-edges --depth 8") == filled);
 }
 
+TEST_F(ProgramTest, PipesAreClipsAsFilesAre) {
+  MakeClip("in.mp4", 64, 48, 5);
+  RunWell("stabilize in.mp4 file.mkv --quiet");
+  for (const std::string name : {"-", "/dev/stdin"}) {
+    EXPECT_EQ(Run("stabilize " + name + " piped.mkv --quiet --overwrite", "cat in.mp4 | ").text,
+              "");
+    EXPECT_TRUE(SamePixels(ReadFrame(*ClipReader::Open(Path("piped.mkv")), 4),
+                           ReadFrame(*ClipReader::Open(Path("file.mkv")), 4)));
+  }
+  ExpectLine("stabilize - no.mkv </dev/null", 3, "neither a file nor a pipe");
+}
+
 TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
   MakeWall("in.mkv", Made(160, 120, 24, 25), AlongTheWall);
   ExpectLine("stabilize in.mkv out.mkv --quiet --result no-motion", 5,
@@ -437,6 +449,14 @@ TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
     EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "log", "p.calm"));
     fs::remove(Path("log"));
   }
+  // Nobody writes; the reader sleeps nowhere else once it is there.
+  const Outcome waiting =
+      Run("stabilize pipe out.mp4 & exec 3>pipe; "
+          "until grep -q 'State:.S' /proc/$!/status; do :; done; kill -INT $!; wait $!",
+          "mkfifo pipe; TMPDIR=. ");
+  EXPECT_EQ(waiting.code, 130);
+  ExpectOneLine(waiting, "interrupted; no output was left");
+  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "p.calm", "pipe"));
 }
 
 TEST_F(ProgramTest, WhatAKilledRunLeftIsSweptAndWhatARunningOneWritesIsNot) {

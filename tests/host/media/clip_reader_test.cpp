@@ -119,6 +119,53 @@ TEST_F(ClipReaderTest, WhatIsCutShortGivesWhatDecodesAndIsTold) {
   EXPECT_EQ(ClipReader::Open(In("whole.mp4"), found)->info().warning, "");
 }
 
+TEST_F(ClipReaderTest, PicturesAndPipesAreClipsAsFilesAre) {
+  std::filesystem::create_directory(In("p"));
+  Ffmpeg("-f lavfi -i testsrc=s=96x64:r=25:d=0.4 -c:v ffv1 -pix_fmt bgr0 " + In("a.mkv") +
+         " -start_number 97 " + In("p/f%d.png") + " -start_number 97 " + In("p/0%03d.jpg"));
+  Output("mkfifo " + In("pipe") + "; (timeout 60 cat " + In("a.mkv") + " >" + In("pipe") + " &) >" +
+         In("log"));
+  const auto file = ClipReader::Open(In("a.mkv"));
+  const auto expect_same = [&](const std::string& name) {
+    SCOPED_TRACE(name);
+    const auto reader = ClipReader::Open(In(name));
+    ASSERT_EQ(reader->info().frame_count, 10u);
+    EXPECT_EQ(reader->info().path, In(name));
+    for (const std::size_t i : {9, 0, 1, 5}) {
+      EXPECT_TRUE(SamePixels(ReadFrame(*reader, i), ReadFrame(*file, i))) << i;
+    }
+  };
+  expect_same("pipe");
+  expect_same("p/f%d.png");
+  const auto fails = [&](const std::string& name, const std::string& cause) {
+    EXPECT_THAT([&] { ClipReader::Open(In(name)); },
+                Fails(Failure::Side::input, testing::HasSubstr(cause)));
+  };
+  fails("p/*.png", "order of their names, f106.png before f97.png");
+  for (int i = 97; i < 107; ++i) {
+    const std::string number = std::to_string(i);
+    std::filesystem::rename(In("p/f" + number + ".png"),
+                            In("p/f" + std::string(i < 100, '0') + number + ".png"));
+  }
+  for (const char* name : {"p/f%03d.png", "p/f*.png"}) expect_same(name);
+  std::filesystem::remove(In("p/0097.jpg"));
+  expect_same("p");  // the kind that is there most
+  std::filesystem::remove(In("p/f100.png"));
+  fails("p/f%03d.png", "p/f%03d.png: f100.png is missing");
+  fails("p/f099.png", "one picture alone has no motion");
+  fails("p/f%04d.png", "no file has such a name");
+}
+
+TEST_F(ClipReaderTest, AMovieWithoutItsIndexIsToldToLackIt) {
+  Ffmpeg("-f lavfi -i testsrc=s=96x64:r=30:d=1 -c:v libx264 " + In("whole.mp4"));
+  const std::string whole = Content("whole.mp4");
+  for (const std::size_t size : {whole.find("moov") - 4, whole.find("mdat") + 1000}) {
+    MakeFile("cut.mp4", whole.substr(0, size));
+    EXPECT_THAT([&] { ClipReader::Open(In("cut.mp4")); },
+                Fails(Failure::Side::input, testing::HasSubstr("its index is missing")));
+  }
+}
+
 TEST_F(ClipReaderTest, DamageAnywhereIsToldOrBreaksThePromiseInEveryRun) {
   MakeWalk("whole.mp4");
   const std::string whole = Content("whole.mp4");
