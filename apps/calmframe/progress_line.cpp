@@ -122,7 +122,7 @@ void ProgressLine::Show(const Progress& progress) {
 }
 
 void ProgressLine::Warn(const std::string& line) {
-  Tell("warning", line);
+  if (warned_.insert(line).second) Tell("warning", line);
 }
 
 void ProgressLine::Note(const std::string& line) {

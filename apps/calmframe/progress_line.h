@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <nlohmann/json_fwd.hpp>
+#include <set>
 #include <string>
 
 namespace calmframe {
@@ -27,7 +28,7 @@ class ProgressLine {
   ProgressLine& operator=(const ProgressLine&) = delete;
 
   void Show(const Progress& progress);
-  // One line that the user should see, in every form.
+  // One line that the user should see, in every form; said once, however often it comes.
   void Warn(const std::string& line);
   // One line about how things went.
   void Note(const std::string& line);
@@ -42,6 +43,7 @@ class ProgressLine {
   std::chrono::steady_clock::time_point stage_begin_;
   std::chrono::steady_clock::time_point last_shown_;
   bool line_open_ = false;
+  std::set<std::string> warned_;
 };
 
 // An object as a line for programs. A file's name may be no UTF-8; then what isn't is replaced.

@@ -42,7 +42,9 @@ RenderCommand::RenderCommand(CLI::App& program)
           "Examples:\n"
           "  calmframe render --project shaky.calm steady.mp4\n"
           "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20")) {
-  AddFile(parser_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe");
+  AddFile(parser_, "OUT", output_,
+          "The steady clip to write; - for a pipe: raw frames, or Matroska with --codec; "
+          "f%04d.png or a folder with / for pictures");
   AddFile(parser_, "--project", project_, "The saved work");
   constexpr int kMost = std::numeric_limits<int>::max();
   AddNumber<int>(
@@ -68,6 +70,7 @@ void RenderCommand::Run() {
   KeepApart(output_, {project_, clip->path()});
   const std::unique_ptr<media::ClipWriter> writer = media::ClipWriter::Create(
       output_, PartOf(info, range), info.width, info.height, flags_.encode);
+  TellLosses(*writer, progress);
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   CheckCrop(*clip, progress);
   RenderClip(*clip, range, {.depth = flags_.depth, .threads = run_.threads}, *writer, progress);

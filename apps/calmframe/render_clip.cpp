@@ -210,6 +210,10 @@ void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSetting
   progress.Show(shown);
 }
 
+void TellLosses(const media::ClipWriter& writer, ProgressLine& progress) {
+  for (const std::string& line : writer.warnings()) progress.Warn(line);
+}
+
 void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
                 media::ClipWriter& writer, ProgressLine& progress) {
   RenderFrames(
@@ -218,7 +222,7 @@ void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings&
         Write(writer, frame - range.first, pixels);
       },
       [&writer] { writer.Finish(); });
-  for (const std::string& line : writer.warnings()) progress.Warn(line);
+  TellLosses(writer, progress);
 }
 
 }  // namespace calmframe

@@ -33,6 +33,9 @@ void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSetting
                   const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
                   const std::function<void()>& finish = {});
 
+// What the writer warns of and was not told yet, such as what its file can't keep of the clip.
+void TellLosses(const media::ClipWriter& writer, ProgressLine& progress);
+
 // The same into a file, which is then whole: frames are counted from the range's first. The
 // writer's warnings are told.
 void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,

@@ -97,9 +97,10 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
       AddName(command, "--codec", flags.encode.codec,
               "Encoder, such as libx265, or the name of what it encodes; at first H.264, or what "
               "the kind of file takes");
-  CLI::Option* const pixel_format =
-      AddName(command, "--pixel-format", flags.encode.pixel_format,
-              "Pixel format of the encoder; at first 4:2:0 of the clip's depth");
+  CLI::Option* const pixel_format = AddName(
+      command, "--pixel-format", flags.encode.pixel_format,
+      "Pixel format of the encoder; at first the clip's own alpha, chroma and depth, as far as "
+      "the codec has them");
   CLI::Option* const depth = AddChoice(
       command, "--depth", [&flags](const std::string& bits) { flags.depth = std::stoi(bits); },
       {"8", "16", "32"},
@@ -122,6 +123,7 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
     // Made first, so that an output that cannot be written costs nobody an analysis.
     const std::unique_ptr<media::ClipWriter> writer =
         media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
+    TellLosses(*writer, progress);
     const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
     CheckCrop(*clip, progress);
     RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
@@ -146,7 +148,9 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
           "  calmframe stabilize talk.mp4 still.mp4 --result no-motion")) {
   AddFile(parser_, "IN", input_,
           "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
-  AddFile(parser_, "OUT", output_, "The steady clip to write; - for raw frames to a pipe");
+  AddFile(parser_, "OUT", output_,
+          "The steady clip to write; - for a pipe: raw frames, or Matroska with --codec; "
+          "f%04d.png or a folder with / for pictures");
   AddControlFlags(parser_, controls_);
   AddOutputFlags(parser_, flags_);
   AddProjectFlag(parser_, project_);

@@ -59,6 +59,7 @@ struct ClipInfo {
   Ratio time_base{1, 25};        // of times, in seconds a tick
   std::vector<FrameTime> times;  // one a frame; empty for a made clip: even times at frame_rate
   std::string codec;             // of the video stream
+  std::string pixel_format;      // of the decoded frames, FFmpeg's name; empty of a made clip
   int bit_depth = 8;             // of a component in the file
   bool has_alpha = false;
   int rotation = 0;       // degrees clockwise that were applied to the pixels: 0, 90, 180 or 270
@@ -120,7 +121,9 @@ class ClipReader {
 struct EncodeSettings {
   std::string codec;  // an encoder's or codec's name; empty: H.264 (or what the container takes)
   int crf = 18;       // for encoders with such a setting; for other lossy ones a like quality
-  std::string pixel_format;  // empty: 4:2:0 of the source's bit depth
+  // Empty: alpha, chroma and depth of the source, as far as encoder and container have them; what
+  // they have not is a warning.
+  std::string pixel_format;
   bool overwrite = false;
 };
 
@@ -129,9 +132,11 @@ struct EncodeSettings {
 class ClipWriter {
  public:
   // width, height: of the written frames, in the source's pixel aspect; with an odd one the default
-  // pixel format is 4:4:4, which alone keeps the size. `path` "-": raw frames (YUV4MPEG2) to the
-  // standard output, nothing else. Everything that can be refused is refused here, so a program
-  // creates the writer before it spends time on the frames. Throws Failure (output).
+  // pixel format is 4:4:4, which alone keeps the size. `path` "-": to the standard output, raw
+  // frames (YUV4MPEG2) and nothing else, or with a codec Matroska (NUT where that can't hold it).
+  // With one %d or %04d, or a / at its end: pictures, from number 1 on. Everything that can be
+  // refused is refused here, so a program creates the writer before it spends time on the frames.
+  // Throws Failure (output).
   static std::unique_ptr<ClipWriter> Create(const std::string& path, const ClipInfo& source,
                                             int width, int height, const EncodeSettings& settings);
   virtual ~ClipWriter() = default;

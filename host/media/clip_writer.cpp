@@ -5,8 +5,10 @@
 #include <utility>
 
 #include "host/media/clip.h"
+#include "host/media/clip_files.h"
 #include "host/media/decoder.h"
 #include "host/media/encoder.h"
+#include "host/media/output_choice.h"
 #include "host/media/output_file.h"
 #include "host/media/pixel_conversion.h"
 #include "host/media/stream_copy.h"
@@ -31,18 +33,40 @@ class FfmpegWriter final : public ClipWriter {
       Fail("can't hold frames of " + std::to_string(width) + " x " + std::to_string(height) +
            " pixels");
     }
-    const AVOutputFormat* format = to_pipe_ ? av_guess_format("yuv4mpegpipe", nullptr, nullptr)
-                                            : av_guess_format(nullptr, path.c_str(), nullptr);
+    const bool into_folder = path.ends_with('/');
+    const std::string name = into_folder ? path + "%06d.png" : path;
+    const AVOutputFormat* format =
+        to_pipe_ ? FormatForPipe(settings) : av_guess_format(nullptr, name.c_str(), nullptr);
     std::error_code ignored;
-    if (std::filesystem::is_directory(path, ignored)) Fail("is a directory");
+    if (!into_folder && std::filesystem::is_directory(path, ignored)) {
+      Fail("is a directory; with a / at its end, pictures are written into it");
+    }
     const std::string extension = std::filesystem::path(path).extension().string();
-    if (!format || format->video_codec == AV_CODEC_ID_NONE || (format->flags & AVFMT_NOFILE)) {
+    const bool pictures = format && HoldsPictures(*format);
+    const auto numbered = NumberedPath::Of(name);
+    if (pictures && !numbered) {
+      Fail("is one picture alone; f%04d" + extension + " names one for each frame");
+    }
+    if (!format || format->video_codec == AV_CODEC_ID_NONE ||
+        ((format->flags & AVFMT_NOFILE) && !pictures)) {
       Fail((extension.empty() ? "its name has no extension to tell the kind of file"
                               : "no kind of video file ends in '" + extension + "'") +
            "; .mp4, .mov, .mkv and .webm are some");
     }
-    if (!to_pipe_) file_.emplace(path, source.path, settings.overwrite);
-    encoder_.emplace(shown_, *format, source, width, height, settings, warnings_);
+    EncodeSettings encode = settings;
+    std::vector<std::string> sources;
+    if (!source.path.empty()) sources = FilesOf(source.path).paths;
+    if (pictures) {
+      encode.codec = avcodec_get_name(
+          av_guess_codec(format, nullptr, name.c_str(), nullptr, AVMEDIA_TYPE_VIDEO));
+      if (!settings.codec.empty() && settings.codec != encode.codec) {
+        Fail("the pictures' extension picks their codec, " + encode.codec);
+      }
+      pictures_.emplace(*numbered, sources, source.frame_count, settings.overwrite, into_folder);
+    } else if (!to_pipe_) {
+      file_.emplace(path, sources.empty() ? "" : sources[0], settings.overwrite);
+    }
+    encoder_.emplace(shown_, *format, source, width, height, encode, warnings_);
     to_frame_.emplace(encoder_->context().pix_fmt, width, height, encoder_->colour());
 
     AVFormatContext* container = nullptr;
@@ -60,11 +84,31 @@ class FfmpegWriter final : public ClipWriter {
     stream->time_base = encoder_->time_base();
     stream->sample_aspect_ratio = encoder_->context().sample_aspect_ratio;
     stream->avg_frame_rate = encoder_->context().framerate;
-    if (!to_pipe_ && !source.path.empty()) CopyFrom(source);
+    const bool raw_frames = std::strcmp(format->name, "yuv4mpegpipe") == 0;
+    if (raw_frames) TagRawFrames(source.colour, *stream->codecpar);
+    if (!raw_frames && !pictures && !source.path.empty()) CopyFrom(source);
 
-    const std::string url = to_pipe_ ? "pipe:1" : "file:" + file_->temporary();
-    Check(avio_open(&container->pb, url.c_str(), AVIO_FLAG_WRITE));
+    if ((stream->codecpar->codec_id == AV_CODEC_ID_VP8 ||
+         stream->codecpar->codec_id == AV_CODEC_ID_VP9) &&
+        stream->codecpar->format == AV_PIX_FMT_YUVA420P) {
+      av_dict_set(&stream->metadata, "alpha_mode", "1", 0);
+    }
+
+    const std::string url = to_pipe_   ? "pipe:1"
+                            : pictures ? "file:" + pictures_->temporary().Pattern()
+                                       : "file:" + file_->temporary();
+    container->url = NotNull(av_strdup(url.c_str()));
+    if (pictures) {
+      container->opaque = &write_error_;
+      container->io_close2 = CloseAndKeepError;
+    } else {
+      Check(avio_open(&container->pb, url.c_str(), AVIO_FLAG_WRITE));
+    }
     AVDictionary* options = nullptr;
+    // Whoever plays a file while it is on its way needs the index in front.
+    if (format->priv_class && av_opt_find(container->priv_data, "movflags", nullptr, 0, 0)) {
+      av_dict_set(&options, "movflags", "+faststart", 0);
+    }
     // The source's clock, kept as it is.
     if (std::strcmp(format->name, "mpegts") == 0) av_dict_set(&options, "mpegts_copyts", "1", 0);
     // A pipe can't take back what is said in it: nothing before the first frame.
@@ -94,12 +138,15 @@ class FfmpegWriter final : public ClipWriter {
     CopyUntil(INT64_MAX);
     Check(av_interleaved_write_frame(container_.get(), nullptr));
     Check(av_write_trailer(container_.get()));
-    avio_flush(container_->pb);
-    const int error = container_->pb->error;
-    const int closed = avio_closep(&container_->pb);
-    Check(error);
-    Check(closed);
+    if (container_->pb) {
+      avio_flush(container_->pb);
+      const int error = container_->pb->error;
+      const int closed = avio_closep(&container_->pb);
+      Check(error);
+      Check(closed);
+    }
     if (file_) file_->Commit();
+    if (pictures_) pictures_->Commit();
   }
 
  private:
@@ -110,9 +157,47 @@ class FfmpegWriter final : public ClipWriter {
     if (error < 0) Fail("can't be written: " + ErrorText(error));
   }
 
+  void CheckWritten() const { Check(container_->pb ? container_->pb->error : write_error_); }
+  // The muxer of pictures closes each without a look at what came of it.
+  static int CloseAndKeepError(AVFormatContext* container, AVIOContext* file) {
+    avio_flush(file);
+    if (file->error < 0) *static_cast<int*>(container->opaque) = file->error;
+    return avio_close(file);
+  }
+
   void WriteHeader() {
     if (std::exchange(headed_, true)) return;
     Check(avformat_write_header(container_.get(), nullptr));
+  }
+
+  // YUV4MPEG2 tells the range, and of 4:2:0 in 8 bits where chroma lies, which without a word would
+  // be another place than the one it has here.
+  void TagRawFrames(const ColourTags& colour, AVCodecParameters& parameters) {
+    std::string dropped;
+    const auto drop = [&](const char* tag, int value, const char* name) {
+      if (value == 0 || value == AVCOL_SPC_UNSPECIFIED) return;
+      dropped += std::string(dropped.empty() ? "" : ", ") + tag + " " + (name ? name : "?");
+    };
+    drop("primaries", colour.primaries,
+         av_color_primaries_name(static_cast<AVColorPrimaries>(colour.primaries)));
+    drop("transfer", colour.transfer,
+         av_color_transfer_name(static_cast<AVColorTransferCharacteristic>(colour.transfer)));
+    drop("matrix", colour.matrix, av_color_space_name(static_cast<AVColorSpace>(colour.matrix)));
+    const auto chroma = encoder_->colour().chroma;
+    if (parameters.format == AV_PIX_FMT_YUV420P) parameters.chroma_location = chroma;
+    const AVPixFmtDescriptor& layout =
+        *NotNull(av_pix_fmt_desc_get(static_cast<AVPixelFormat>(parameters.format)));
+    const bool placed = parameters.format == AV_PIX_FMT_YUV420P
+                            ? chroma <= AVCHROMA_LOC_TOPLEFT
+                            : chroma == AVCHROMA_LOC_LEFT || layout.log2_chroma_w == 0;
+    if (!placed) {
+      dropped += std::string(dropped.empty() ? "" : ", ") + "chroma location " +
+                 av_chroma_location_name(chroma);
+    }
+    if (dropped.empty()) return;
+    warnings_.push_back(shown_ + ": raw frames don't tell the clip's colour tags (" + dropped +
+                        "); " +
+                        (to_pipe_ ? "--codec rawvideo keeps them" : "an .mkv file keeps them"));
   }
 
   void CopyFrom(const ClipInfo& source) {
@@ -155,7 +240,7 @@ class FfmpegWriter final : public ClipWriter {
       av_packet_rescale_ts(packet.get(), from, to);
       packet->stream_index = 0;
       Check(av_interleaved_write_frame(container_.get(), packet.get()));
-      Check(container_->pb->error);
+      CheckWritten();
     }
   }
 
@@ -165,7 +250,7 @@ class FfmpegWriter final : public ClipWriter {
       if (!packet) break;
       const int stream = packet->stream_index;
       const int error = av_interleaved_write_frame(container_.get(), packet.get());
-      Check(container_->pb->error);
+      CheckWritten();
       if (error == AVERROR(ENOMEM)) throw std::bad_alloc();
       if (error < 0) {
         const std::string line = shown_ + ": packets of stream " + std::to_string(stream) +
@@ -179,6 +264,8 @@ class FfmpegWriter final : public ClipWriter {
   const bool to_pipe_;
   std::vector<std::string> warnings_;
   std::optional<OutputFile> file_;
+  std::optional<OutputPictures> pictures_;
+  int write_error_ = 0;  // of pictures
   std::optional<Encoder> encoder_;
   std::optional<PixelsToFrame> to_frame_;
   std::unique_ptr<AVFormatContext, OutputDelete> container_;

@@ -66,6 +66,20 @@ void CountComplaint(void* speaker, int level, const char*, va_list) {
   if (count) ++*static_cast<std::atomic<int>*>(count);
 }
 
+// FFmpeg's own decoders of VP8 and VP9 leave out the alpha beside the frames.
+const AVCodec* AlphaDecoderFor(const AVStream& stream) {
+  const AVDictionaryEntry* mode = av_dict_get(stream.metadata, "alpha_mode", nullptr, 0);
+  if (!mode || std::string_view(mode->value) != "1") return nullptr;
+  switch (stream.codecpar->codec_id) {
+    case AV_CODEC_ID_VP8:
+      return avcodec_find_decoder_by_name("libvpx");
+    case AV_CODEC_ID_VP9:
+      return avcodec_find_decoder_by_name("libvpx-vp9");
+    default:
+      return nullptr;
+  }
+}
+
 }  // namespace
 
 void ListenToFfmpeg() {
@@ -137,19 +151,21 @@ void Decoder::Open() {
   if (parameters.codec_id == AV_CODEC_ID_NONE) {
     Fail(path_, "its video is of a kind that is not known, or it is damaged at its start");
   }
-  const AVCodec* decoder = avcodec_find_decoder(parameters.codec_id);
+  const AVCodec* const with_alpha = AlphaDecoderFor(*stream_);
+  const AVCodec* decoder = with_alpha ? with_alpha : avcodec_find_decoder(parameters.codec_id);
   if (!decoder) {
     Fail(path_, std::string("no decoder for ") + avcodec_get_name(parameters.codec_id));
   }
   codec_.reset(NotNull(avcodec_alloc_context3(decoder)));
   int error = avcodec_parameters_to_context(codec_.get(), &parameters);
   codec_->pkt_timebase = stream_->time_base;
-  codec_->opaque = &complaints_;
+  codec_->opaque = with_alpha ? nullptr : &complaints_;  // it gives its version as it opens
   codec_->thread_count = threads_;
   codec_->thread_type = FF_THREAD_FRAME | FF_THREAD_SLICE;
   codec_->max_pixels = kMaximumPixels;
   if (error >= 0) error = avcodec_open2(codec_.get(), decoder, nullptr);
   if (error < 0) Fail(path_, std::string("decoder ") + decoder->name + " can't begin", error);
+  codec_->opaque = &complaints_;
 }
 
 bool Decoder::Feed() {

@@ -4,6 +4,7 @@
 #include <cstring>
 
 #include "host/base/nearest_match.h"
+#include "host/media/output_choice.h"
 
 namespace calmframe::media {
 namespace {
@@ -28,42 +29,6 @@ std::vector<std::string> EncoderNames() {
   return names;
 }
 
-AVPixelFormat ChoosePixelFormat(const std::string& shown, const AVCodec& codec,
-                                const ClipInfo& source, int width, int height,
-                                const std::string& name) {
-  std::vector<AVPixelFormat> usable;
-  for (const AVPixelFormat* f = codec.pix_fmts; f && *f != AV_PIX_FMT_NONE; ++f) {
-    if (sws_isSupportedOutput(*f)) usable.push_back(*f);
-  }
-  const auto has = [&](AVPixelFormat f) {
-    return !codec.pix_fmts || std::find(usable.begin(), usable.end(), f) != usable.end();
-  };
-  if (!name.empty()) {
-    const AVPixelFormat asked = av_get_pix_fmt(name.c_str());
-    if (asked != AV_PIX_FMT_NONE && sws_isSupportedOutput(asked) && has(asked)) return asked;
-    std::vector<std::string> names;
-    for (const AVPixelFormat f : usable) names.emplace_back(av_get_pix_fmt_name(f));
-    if (names.empty()) names = {"yuv420p", "yuv422p", "yuv444p", "yuv420p10le"};
-    throw Failure(Failure::Side::output, shown + ": pixel format '" + name + "' is not one of " +
-                                             codec.name + "'s" + NearestHint(name, names));
-  }
-  const bool odd = width % 2 != 0 || height % 2 != 0;
-  const bool deep = source.bit_depth > 8;
-  const AVPixelFormat shallow = odd ? AV_PIX_FMT_YUV444P : AV_PIX_FMT_YUV420P;
-  const AVPixelFormat wanted = deep ? (odd ? AV_PIX_FMT_YUV444P10 : AV_PIX_FMT_YUV420P10) : shallow;
-  if (has(wanted)) return wanted;
-  if (has(shallow)) return shallow;
-  AVPixelFormat best = AV_PIX_FMT_NONE;
-  for (const AVPixelFormat f : usable) {
-    best = best == AV_PIX_FMT_NONE ? f : av_find_best_pix_fmt_of_2(best, f, wanted, 0, nullptr);
-  }
-  if (best == AV_PIX_FMT_NONE) {
-    throw Failure(Failure::Side::output,
-                  shown + ": encoder " + codec.name + " takes no frames from memory");
-  }
-  return best;
-}
-
 // Containers that state one frame rate in place of a time for each frame.
 bool HasOneRate(const AVOutputFormat& format) {
   if (format.flags & AVFMT_NOTIMESTAMPS) return true;
@@ -72,6 +37,18 @@ bool HasOneRate(const AVOutputFormat& format) {
 }
 
 }  // namespace
+
+const AVOutputFormat* FormatForPipe(const EncodeSettings& settings) {
+  const auto named = [](const char* name) { return av_guess_format(name, nullptr, nullptr); };
+  const AVCodec* codec = settings.codec.empty() ? nullptr : FindEncoder(settings.codec);
+  if (settings.codec.empty() || (codec && codec->id == AV_CODEC_ID_WRAPPED_AVFRAME)) {
+    return named("yuv4mpegpipe");
+  }
+  const AVOutputFormat* matroska = named("matroska");
+  const bool taken =
+      !codec || avformat_query_codec(matroska, codec->id, FF_COMPLIANCE_UNOFFICIAL) != 0;
+  return taken ? matroska : named("nut");
+}
 
 Encoder::Encoder(const std::string& shown, const AVOutputFormat& format, const ClipInfo& source,
                  int width, int height, const EncodeSettings& settings,
@@ -84,7 +61,8 @@ Encoder::Encoder(const std::string& shown, const AVOutputFormat& format, const C
       throw Failure(Failure::Side::output, shown + ": no video codec '" + settings.codec + "'" +
                                                NearestHint(settings.codec, EncoderNames()));
     }
-    if (avformat_query_codec(&format, codec->id, FF_COMPLIANCE_UNOFFICIAL) == 0) {
+    if (!HoldsPictures(format) &&
+        avformat_query_codec(&format, codec->id, FF_COMPLIANCE_UNOFFICIAL) == 0) {
       throw Failure(Failure::Side::output, shown + ": a " + format.name + " file can't hold " +
                                                avcodec_get_name(codec->id));
     }
@@ -100,7 +78,11 @@ Encoder::Encoder(const std::string& shown, const AVOutputFormat& format, const C
   }
   even_times_ = HasOneRate(format);
   const AVPixelFormat pixel_format =
-      ChoosePixelFormat(shown, *codec, source, width, height, settings.pixel_format);
+      ChoosePixelFormat(shown, *codec, format, source, width, height, settings.pixel_format);
+  if (settings.pixel_format.empty()) {
+    const std::string line = LossLine(shown, *codec, format, source, pixel_format, settings.crf);
+    if (!line.empty()) warnings.push_back(line);
+  }
   int error = 0;
   by_number_ = even_times_;
   if (!Open(*codec, format, source, settings, pixel_format, error)) {
@@ -149,22 +131,28 @@ bool Encoder::Open(const AVCodec& codec, const AVOutputFormat& format, const Cli
   if (format.flags & AVFMT_GLOBALHEADER) c.flags |= AV_CODEC_FLAG_GLOBAL_HEADER;
 
   const AVPixFmtDescriptor& layout = *av_pix_fmt_desc_get(pixel_format);
-  model_ = ModelOf(source.colour, pixel_format, source.width, source.height);
-  c.color_primaries = static_cast<AVColorPrimaries>(source.colour.primaries);
-  c.color_trc = static_cast<AVColorTransferCharacteristic>(source.colour.transfer);
+  ColourTags colour = source.colour;
+  // RGB says "full", which for YUV is the uncommon choice.
+  const bool rgb = IsRgb(source) || colour.matrix == AVCOL_SPC_RGB;
+  if (rgb && colour.range == AVCOL_RANGE_JPEG) colour.range = AVCOL_RANGE_MPEG;
+  if (HoldsPictures(format)) {
+    colour.matrix = AVCOL_SPC_BT470BG;  // JPEG knows no other, nor another place of chroma
+    colour.chroma_location = AVCHROMA_LOC_CENTER;
+  }
+  model_ = ModelOf(colour, pixel_format, source.width, source.height);
+  c.color_primaries = static_cast<AVColorPrimaries>(colour.primaries);
+  c.color_trc = static_cast<AVColorTransferCharacteristic>(colour.transfer);
   if (layout.flags & AV_PIX_FMT_FLAG_RGB) {
     c.colorspace = AVCOL_SPC_RGB;
     c.color_range = AVCOL_RANGE_JPEG;
   } else {
-    const bool silent = source.colour.matrix == AVCOL_SPC_UNSPECIFIED;
+    const bool silent = colour.matrix == AVCOL_SPC_UNSPECIFIED;
     c.colorspace = silent ? AVCOL_SPC_UNSPECIFIED : model_.matrix;
-    // RGB sources say "full", which for YUV is the uncommon choice.
-    if (source.colour.matrix == AVCOL_SPC_RGB) model_.full_range = false;
-    c.color_range = model_.full_range                                ? AVCOL_RANGE_JPEG
-                    : source.colour.range == AVCOL_RANGE_UNSPECIFIED ? AVCOL_RANGE_UNSPECIFIED
-                                                                     : AVCOL_RANGE_MPEG;
+    c.color_range = model_.full_range                         ? AVCOL_RANGE_JPEG
+                    : colour.range == AVCOL_RANGE_UNSPECIFIED ? AVCOL_RANGE_UNSPECIFIED
+                                                              : AVCOL_RANGE_MPEG;
   }
-  c.chroma_sample_location = static_cast<AVChromaLocation>(source.colour.chroma_location);
+  c.chroma_sample_location = static_cast<AVChromaLocation>(colour.chroma_location);
 
   const bool interlaced = source.field_order != FieldOrder::progressive && height_ % 4 == 0;
   model_.fields = interlaced;
@@ -182,6 +170,10 @@ bool Encoder::Open(const AVCodec& codec, const AVOutputFormat& format, const Cli
   } else {
     c.flags |= AV_CODEC_FLAG_QSCALE;
     c.global_quality = FF_QP2LAMBDA * std::clamp(settings.crf / 6, 1, 31);
+  }
+  // VP8 and VP9 have no hidden frames beside alpha.
+  if (c.priv_data && (layout.flags & AV_PIX_FMT_FLAG_ALPHA)) {
+    av_opt_set_int(c.priv_data, "auto-alt-ref", 0, 0);
   }
   // It writes to the standard error past the library's log.
   if (c.priv_data) av_opt_set(c.priv_data, "x265-params", "log-level=error", 0);

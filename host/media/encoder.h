@@ -10,6 +10,10 @@
 
 namespace calmframe::media {
 
+// The container for a pipe: raw frames (YUV4MPEG2), or of a codec that is asked for Matroska, or
+// NUT where that doesn't take it.
+const AVOutputFormat* FormatForPipe(const EncodeSettings& settings);
+
 // The video encoder of a written clip, and the clock of its packets.
 class Encoder {
  public:

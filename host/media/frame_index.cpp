@@ -198,6 +198,7 @@ ClipInfo InfoOf(const std::string& path, const Decoder& decoder, std::vector<Fra
   info.pixel_aspect = ToRatio(aspect);
   const AVPixFmtDescriptor* layout = av_pix_fmt_desc_get(static_cast<AVPixelFormat>(first.format));
   if (layout) {
+    info.pixel_format = layout->name;
     info.bit_depth =
         layout->flags & AV_PIX_FMT_FLAG_PAL ? 8 : std::clamp(layout->comp[0].depth, 8, 16);
     info.has_alpha = (layout->flags & AV_PIX_FMT_FLAG_ALPHA) != 0;

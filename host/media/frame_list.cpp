@@ -10,9 +10,10 @@ namespace {
 
 using tessel::filesupport::StreamError;
 
-// 2: damaged streams are read by one thread. Goes up with every change of what stands in the bytes,
-// and of how ScanFrames numbers frames or what it tells of them.
-constexpr std::uint32_t kVersion = 2;
+// 2: damaged streams are read by one thread. 3: the pixel format, and alpha of VP9. Goes up with
+// every change of what stands in the bytes, and of how ScanFrames numbers frames or what it tells
+// of them.
+constexpr std::uint32_t kVersion = 3;
 
 constexpr std::size_t kLongestText = 200;
 // Of a frame in the inflated bytes: two times, the fingerprint, the keyframe's mark.
@@ -36,6 +37,7 @@ void VisitInfo(Info& info, const Visit& visit) {
     visit(ratio->den);
   }
   visit(info.codec);
+  visit(info.pixel_format);
   visit(info.bit_depth);
   visit(info.has_alpha);
   visit(info.rotation);

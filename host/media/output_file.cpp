@@ -10,21 +10,24 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <set>
 #include <system_error>
+#include <utility>
 
 #include "host/media/clip.h"
 
 namespace calmframe::media {
 namespace {
 
-[[noreturn]] void Fail(const std::string& path, const std::string& cause) {
+[[noreturn]] void FailToWrite(const std::string& path, const std::string& cause) {
   throw Failure(Failure::Side::output, path + ": " + cause);
 }
 
+constexpr char kExists[] = "exists already (--overwrite replaces it)";
 constexpr char kPrefix[] = ".calmframe-";
 constexpr char kSuffix[] = ".part";
 
-// What a program that was killed has left in the folder: who writes holds a lock on its file, which
+// What a program that was killed has left in the folder: who writes holds a lock on its part, which
 // ends with it.
 void Sweep(const std::filesystem::path& folder) {
   std::error_code error;
@@ -32,85 +35,154 @@ void Sweep(const std::filesystem::path& folder) {
        !error && entry != end; entry.increment(error)) {
     const std::string name = entry->path().filename().string();
     if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix)) continue;
-    const int file = open(entry->path().c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
-    if (file < 0) continue;
-    if (flock(file, LOCK_EX | LOCK_NB) == 0) unlink(entry->path().c_str());
-    close(file);
+    const int part = open(entry->path().c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+    if (part < 0) continue;
+    std::error_code ignored;
+    if (flock(part, LOCK_EX | LOCK_NB) == 0) std::filesystem::remove_all(entry->path(), ignored);
+    close(part);
   }
 }
 
-// The file's descriptor where nobody has swept it between its making and its locking; else -1.
-int Locked(int file) {
-  if (file < 0) return -1;
+// The part's descriptor where nobody has swept it between its making and its locking; else -1.
+int Locked(int part) {
+  if (part < 0) return -1;
   struct stat status;
-  while (flock(file, LOCK_EX) != 0 && errno == EINTR) {  // other errors: without locks no sweep
+  while (flock(part, LOCK_EX) != 0 && errno == EINTR) {  // other errors: without locks no sweep
   }
-  if (fstat(file, &status) == 0 && status.st_nlink > 0) return file;
-  close(file);
+  if (fstat(part, &status) == 0 && status.st_nlink > 0) return part;
+  close(part);
   errno = EEXIST;  // another name, then
   return -1;
 }
 
-}  // namespace
+int Made(const std::string& path, bool is_folder) {
+  if (!is_folder) return open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666);
+  if (mkdir(path.c_str(), 0777) != 0) return -1;
+  return open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+}
 
-OutputFile::OutputFile(const std::string& path, const std::string& source, bool overwrite)
-    : shown_(path), overwrite_(overwrite), path_(path) {
+// What a file is, under any name.
+using Identity = std::pair<dev_t, ino_t>;
+
+std::set<Identity> IdentitiesOf(const std::vector<std::string>& paths) {
+  std::set<Identity> identities;
   struct stat status;
-  if (stat(path.c_str(), &status) == 0) {
-    struct stat source_status;
-    if (!source.empty() && stat(source.c_str(), &source_status) == 0 &&
-        source_status.st_dev == status.st_dev && source_status.st_ino == status.st_ino) {
-      Fail(path, "is the input itself");
-    }
-    if (S_ISDIR(status.st_mode)) Fail(path, "is a directory");
-    if (!S_ISREG(status.st_mode)) Fail(path, "is not a file on disk");
-    if (!overwrite) Fail(path, "exists already (--overwrite replaces it)");
-    std::error_code error;
-    const auto target = std::filesystem::canonical(path, error);
-    if (!error) path_ = target.string();
-  } else if (errno != ENOENT) {
-    Fail(path, std::strerror(errno));
+  for (const std::string& path : paths) {
+    if (stat(path.c_str(), &status) == 0) identities.emplace(status.st_dev, status.st_ino);
   }
-  // A name of its own length, so that a long final name leaves room for it.
-  static std::atomic<unsigned> serial = 0;
-  const std::filesystem::path folder = std::filesystem::path(path_).parent_path();
-  Sweep(folder);
-  do {
-    temporary_ =
-        (folder / (kPrefix + std::to_string(getpid()) + "-" + std::to_string(serial++) + kSuffix))
-            .string();
-    lock_ = Locked(open(temporary_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666));
-  } while (lock_ < 0 && errno == EEXIST);
-  if (lock_ < 0) {
-    const int error = errno;
-    temporary_.clear();
-    Fail(path, "can't be written: " + (error == ENOENT ? "there is no folder " + folder.string()
-                                                       : std::string(std::strerror(error))));
+  return identities;
+}
+
+// Whether there is something, which may be replaced.
+bool Replaces(const std::string& path, const std::set<Identity>& sources, bool overwrite) {
+  struct stat status;
+  if (stat(path.c_str(), &status) != 0) {
+    if (errno != ENOENT) FailToWrite(path, std::strerror(errno));
+    return false;
+  }
+  if (sources.count({status.st_dev, status.st_ino}) > 0) FailToWrite(path, "is the input itself");
+  if (S_ISDIR(status.st_mode)) FailToWrite(path, "is a directory");
+  if (!S_ISREG(status.st_mode)) FailToWrite(path, "is not a file on disk");
+  if (!overwrite) FailToWrite(path, kExists);
+  return true;
+}
+
+std::string PlaceOf(const std::string& path, const std::string& source, bool overwrite) {
+  if (!Replaces(path, IdentitiesOf({source}), overwrite)) return path;
+  std::error_code error;
+  const auto target = std::filesystem::canonical(path, error);
+  return error ? path : target.string();
+}
+
+void GiveName(const std::string& part, const std::string& path, bool overwrite,
+              const std::string& shown) {
+  // Linking fails where renaming would replace a file that came up meanwhile.
+  if (!overwrite && link(part.c_str(), path.c_str()) == 0) {
+    unlink(part.c_str());
+    return;
+  }
+  if (!overwrite && errno == EEXIST) FailToWrite(shown, kExists);
+  if (std::rename(part.c_str(), path.c_str()) != 0) {
+    FailToWrite(shown, std::string("can't be written: ") + std::strerror(errno));
   }
 }
 
-OutputFile::~OutputFile() {
-  if (!temporary_.empty()) unlink(temporary_.c_str());
+}  // namespace
+
+OutputPart::OutputPart(const std::string& folder, bool is_folder, const std::string& shown) {
+  static std::atomic<unsigned> serial = 0;
+  const std::filesystem::path place(folder);
+  Sweep(place);
+  do {
+    // A name of its own length, so that a long final name leaves room for it.
+    path_ =
+        (place / (kPrefix + std::to_string(getpid()) + "-" + std::to_string(serial++) + kSuffix))
+            .string();
+    lock_ = Locked(Made(path_, is_folder));
+  } while (lock_ < 0 && errno == EEXIST);
+  if (lock_ < 0) {
+    FailToWrite(shown,
+                "can't be written: " + (errno == ENOENT ? "there is no folder " + folder
+                                                        : std::string(std::strerror(errno))));
+  }
+}
+
+OutputPart::~OutputPart() {
+  std::error_code ignored;
+  std::filesystem::remove_all(path_, ignored);
   close(lock_);
 }
 
+OutputFile::OutputFile(const std::string& path, const std::string& source, bool overwrite)
+    : shown_(path),
+      overwrite_(overwrite),
+      path_(PlaceOf(path, source, overwrite)),
+      part_(std::filesystem::path(path_).parent_path().string(), false, path) {}
+
 void OutputFile::Commit() {
-  const int file = open(temporary_.c_str(), O_RDONLY | O_CLOEXEC);
+  const int file = open(temporary().c_str(), O_RDONLY | O_CLOEXEC);
   const bool flushed = file >= 0 && fsync(file) == 0;
   const int error = errno;
   if (file >= 0) close(file);
-  if (!flushed) Fail(shown_, std::string("can't be written: ") + std::strerror(error));
-  // Linking fails where renaming would replace a file that came up meanwhile.
-  if (!overwrite_ && link(temporary_.c_str(), path_.c_str()) == 0) {
-    unlink(temporary_.c_str());
-    temporary_.clear();
-    return;
+  if (!flushed) FailToWrite(shown_, std::string("can't be written: ") + std::strerror(error));
+  GiveName(temporary(), path_, overwrite_, shown_);
+}
+
+OutputPictures::OutputPictures(const NumberedPath& paths, const std::vector<std::string>& sources,
+                               std::size_t count, bool overwrite, bool makes_folder)
+    : paths_(paths),
+      count_(static_cast<int>(count)),
+      overwrite_(overwrite),
+      made_folder_(makes_folder && mkdir(paths.folder.c_str(), 0777) == 0) {
+  try {
+    const std::set<Identity> identities = IdentitiesOf(sources);
+    for (int i = 1; i <= count_; ++i) Replaces(paths_.At(i), identities, overwrite);
+    part_.emplace(paths_.folder, true, paths_.At(1));
+  } catch (...) {
+    if (made_folder_) rmdir(paths_.folder.c_str());
+    throw;
   }
-  if (!overwrite_ && errno == EEXIST) Fail(shown_, "exists already (--overwrite replaces it)");
-  if (std::rename(temporary_.c_str(), path_.c_str()) != 0) {
-    Fail(shown_, std::string("can't be written: ") + std::strerror(errno));
+}
+
+OutputPictures::~OutputPictures() {
+  part_.reset();
+  if (made_folder_) rmdir(paths_.folder.c_str());  // where nothing came into it
+}
+
+NumberedPath OutputPictures::temporary() const {
+  NumberedPath paths = paths_;
+  paths.folder = part_->path() + '/';
+  return paths;
+}
+
+void OutputPictures::Commit() {
+  if (syncfs(part_->lock()) != 0) {
+    FailToWrite(paths_.At(1), std::string("can't be written: ") + std::strerror(errno));
   }
-  temporary_.clear();
+  const NumberedPath written = temporary();
+  for (int i = 1; i <= count_; ++i) {
+    GiveName(written.At(i), paths_.At(i), overwrite_, paths_.At(i));
+  }
 }
 
 }  // namespace calmframe::media

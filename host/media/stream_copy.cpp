@@ -97,7 +97,8 @@ StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVForma
 
 void StreamCopy::CopyVideoProperties(const AVStream& from, AVStream& to) {
   CopyTags(from.metadata, to.metadata);
-  for (const char* key : {"rotate", "encoder", "DURATION", "BPS", "NUMBER_OF_BYTES"}) {
+  for (const char* key :
+       {"rotate", "encoder", "alpha_mode", "DURATION", "BPS", "NUMBER_OF_BYTES"}) {
     av_dict_set(&to.metadata, key, nullptr, 0);
   }
   to.disposition = from.disposition;

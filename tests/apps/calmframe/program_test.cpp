@@ -78,7 +78,32 @@ TEST_F(ProgramTest, ADeepClipIsDrawnDeep) {
   EXPECT_FALSE(drawn("--framing synthesize-edges --depth 8") == filled);
 }
 
-TEST_F(ProgramTest, PipesAreClipsAsFilesAre) {
+TEST_F(ProgramTest, APipeGetsWhatItsCodecNeedsAndIsToldOfEachTagThatIsDropped) {
+  media::ClipInfo info = Made(64, 48, 5, 25);
+  info.colour = {1, 1, 1, 1, 2};
+  MakeWall("in.mkv", info, AlongTheWall);
+  const std::string dropped = "(primaries bt709, transfer bt709, matrix bt709)";
+  for (const std::string codec : {"", "rawvideo", "libx264", "wrapped_avframe"}) {
+    SCOPED_TRACE(codec);
+    RunWell("stabilize in.mkv - " + (codec.empty() ? "" : "--quiet --codec " + codec) +
+            " 2>log >out");
+    const media::ClipInfo piped = ClipReader::Open(Path("out"))->info();
+    EXPECT_EQ(piped.frame_count, 5u);
+    if (codec == "rawvideo" || codec == "libx264") {
+      EXPECT_EQ(piped.colour, info.colour);
+      EXPECT_EQ(Content("log"), "");
+    } else {
+      EXPECT_EQ(piped.codec, "rawvideo");
+      EXPECT_EQ(piped.colour, (media::ColourTags{2, 2, 2, 1, 2}));
+      EXPECT_THAT(Content("log"),  // before any work
+                  ::testing::StartsWith("calmframe: standard output: raw frames don't tell the "
+                                        "clip's colour tags " +
+                                        dropped));
+    }
+  }
+}
+
+TEST_F(ProgramTest, PipesAndPicturesGoInAndPicturesComeOut) {
   MakeClip("in.mp4", 64, 48, 5);
   RunWell("stabilize in.mp4 file.mkv --quiet");
   for (const std::string name : {"-", "/dev/stdin"}) {
@@ -87,7 +112,23 @@ TEST_F(ProgramTest, PipesAreClipsAsFilesAre) {
     EXPECT_TRUE(SamePixels(ReadFrame(*ClipReader::Open(Path("piped.mkv")), 4),
                            ReadFrame(*ClipReader::Open(Path("file.mkv")), 4)));
   }
+  RunWell("stabilize in.mp4 made/ --quiet");
+  ExpectLine("stabilize in.mp4 made/", 4, "made/000001.png: exists already");
+  ExpectLine("stabilize in.mp4 made", 4, "is a directory; with a / at its end");
   ExpectLine("stabilize - no.mkv </dev/null", 3, "neither a file nor a pipe");
+  ExpectLine("stabilize in.mp4 f.png", 4, "f%04d.png");
+  ExpectLine("stabilize made made/ --overwrite", 4, "is the input itself");
+  ExpectLine("stabilize in.mp4 no/f%d.png", 4, "there is no folder no/");
+  RunWell("analyze made --project p.calm --quiet");
+  RunWell("render --project p.calm f%02d.jpg --quiet");
+  const auto in = ClipReader::Open(Path("made")), out = ClipReader::Open(Path("f*.jpg"));
+  ASSERT_EQ(out->info().frame_count, 5u);
+  const auto a = ReadFrame(*in, 2), b = ReadFrame(*out, 2);
+  double off = 0;
+  for (std::size_t i = 0; i < a.size(); ++i) off += a[i].red - b[i].red;
+  EXPECT_NEAR(off / static_cast<double>(a.size()), 0, 2);  // the same range and matrix
+  EXPECT_THAT(Files(), ::testing::ElementsAre("f01.jpg", "f02.jpg", "f03.jpg", "f04.jpg", "f05.jpg",
+                                              "file.mkv", "in.mp4", "made", "p.calm", "piped.mkv"));
 }
 
 TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
@@ -462,12 +503,12 @@ TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
 TEST_F(ProgramTest, WhatAKilledRunLeftIsSweptAndWhatARunningOneWritesIsNot) {
   MakeClip("in.mp4", 160, 120, 60);
   const std::string rendering = " 2>log & until grep -qs rendering log; do :; done; ";
-  const std::string run =
-      "stabilize in.mp4 out.mp4 --synthesis-input-range 2 "
-      "--framing synthesize-edges";
-  Run(run + rendering + "kill -KILL $!; wait $!");
-  const std::set<std::string> killed = Files();
-  EXPECT_EQ(killed.size(), 3u);
+  const std::string flags = " --synthesis-input-range 2 --framing synthesize-edges";
+  const std::string run = "stabilize in.mp4 out.mp4" + flags;
+  for (const std::string out : {"out.mp4", "out%d.png"}) {  // a file, a folder
+    Run("stabilize in.mp4 " + out + flags + rendering + "kill -KILL $!; wait $!");
+    EXPECT_EQ(Files().size(), 3u);
+  }
   EXPECT_EQ(
       Run(run + rendering + CALMFRAME_PROGRAM " stabilize in.mp4 other.mp4 --quiet; wait $!").code,
       0);

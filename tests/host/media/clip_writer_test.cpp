@@ -110,6 +110,8 @@ TEST_F(ClipTest, VariableRateAndOtherStreamsGoThroughUntouched) {
         Output("ffprobe -v error -show_entries format_tags=title:stream_tags " + In(name));
     EXPECT_THAT(probe, testing::AllOf(HasSubstr("title=Walk"), HasSubstr("language=fr")));
   }
+  const std::string bytes = Content("out.mp4");
+  EXPECT_LT(bytes.find("moov"), bytes.find("mdat"));
 }
 
 TEST_F(ClipTest, TagsAspectAndFieldsAreKept) {
@@ -124,6 +126,57 @@ TEST_F(ClipTest, TagsAspectAndFieldsAreKept) {
   EXPECT_EQ(read.pixel_aspect, info.pixel_aspect);
   EXPECT_EQ(read.field_order, info.field_order);
   EXPECT_EQ(read.colour, info.colour);
+}
+
+TEST_F(ClipTest, WhatTheCodecHasOfTheSourceIsKeptAndTheRestIsTold) {
+  const struct {
+    std::string make, name, out, codec, format, told;
+  } cases[] = {
+      {"prores_ks -pix_fmt yuv422p10le", "0.mov", "0o.mov", "prores", "yuv422p10le", ""},
+      // Decoders give ProRes 4444 as 12 bits.
+      {"prores_ks -pix_fmt yuva444p10le", "1.mov", "1o.mov", "prores", "yuva444p12le",
+       "prores drops the clip's 12 bits (10 stay); --codec ffv1 in .mkv keeps all"},
+      {"ffv1 -pix_fmt yuv422p12le", "2.mkv", "2o.mkv", "ffv1", "yuv422p12le", ""},
+      {"ffv1 -pix_fmt bgr0", "3.mkv", "3o.mkv", "ffv1", "bgr0", ""},
+      {"libvpx-vp9 -auto-alt-ref 0 -pix_fmt yuva420p", "4.webm", "4o.webm", "", "yuva420p", ""},
+      {"libx265 -x265-params log-level=none -pix_fmt yuv420p10le", "5.mp4", "5o.mp4", "libx265",
+       "yuv420p10le", ""},
+      {"mjpeg -pix_fmt yuvj422p", "6.avi", "6o.mp4", "", "yuvj422p", ""},
+      {"ffv1 -pix_fmt yuv444p", "7.mkv", "7o.mp4", "", "yuv444p",
+       "h264 drops the clip's losslessness; --crf 0 keeps all"},
+      {"ffv1 -pix_fmt yuva420p", "8.mkv", "8o.mp4", "", "yuv420p",
+       "h264 drops the clip's alpha and losslessness; --codec ffv1 in .mkv keeps all"},
+      {"libx264 -pix_fmt yuv422p", "9.mp4", "9o.mkv", "mpeg4", "yuv420p",
+       "mpeg4 drops the clip's 4:2:2 chroma (4:2:0 stays); --codec libx264 keeps all"},
+      {"qtrle -pix_fmt argb", "10.mov", "10o.y4m", "", "yuv444p",
+       "YUV4MPEG2 drops the clip's alpha and losslessness; --codec rawvideo to - keeps all"},
+      {"libvpx-vp9 -auto-alt-ref 0 -pix_fmt yuva420p", "11.webm", "11o.mp4", "", "yuv420p",
+       "h264 drops the clip's alpha; --codec libvpx-vp9 in .webm keeps all"},
+      {"ffv1 -pix_fmt bgr0", "12.mkv", "12o.mp4", "", "yuv444p",
+       "h264 drops the clip's losslessness; --codec ffv1 in .mkv keeps all"},
+      {"qtrle -pix_fmt argb", "13.mov", "13o%d.jpg", "", "yuvj444p",
+       "mjpeg drops the clip's alpha and losslessness; a name like f%04d.png keeps all"},
+  };
+  std::string make = "-f lavfi -i testsrc=s=64x48:r=25,format=rgba,colorchannelmixer=aa=0.5 ";
+  for (const auto& c : cases) make += "-frames:v 5 -c:v " + c.make + " " + In(c.name) + " ";
+  Ffmpeg(make);
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    const auto reader = ClipReader::Open(In(c.name));
+    const auto copied = [&](int frame, HX_Pixel8* pixels) { reader->Read(frame, pixels, 64 * 4); };
+    const auto told =
+        WriteClip(In(c.out), reader->info(), copied, {.codec = c.codec, .pixel_format = ""});
+    if (c.told.empty()) {
+      EXPECT_THAT(told, testing::IsEmpty());
+    } else {
+      EXPECT_THAT(told, testing::ElementsAre(testing::EndsWith(c.told)));
+    }
+    const auto written = ClipReader::Open(In(c.out));
+    EXPECT_EQ(written->info().pixel_format, c.format);
+    if (written->info().has_alpha) {
+      EXPECT_NEAR(ReadFrame(*written, 1)[99].alpha, 128, 2);
+    }
+  }
 }
 
 TEST_F(ClipTest, AFullDiskIsToldAndLeavesNothing) {
