@@ -25,16 +25,18 @@ void FindMaximaKernel(const float* above, const float* row, const float* below,
   const std::size_t count = folding.positions() * kSegments;
   for (std::size_t lanes_from = 0; lanes_from < kSegments; lanes_from += N) {
     // Of a position: the larger of the scores above and below, and of all three.
-    const auto outer = [&](std::size_t i) HWY_ATTR {
+    const auto outer = [&](std::ptrdiff_t i) HWY_ATTR {
       return hn::Max(hn::LoadU(d, above + i), hn::LoadU(d, below + i));
     };
+    const auto start = static_cast<std::ptrdiff_t>(lanes_from);
+    constexpr auto kStep = static_cast<std::ptrdiff_t>(kSegments);
     auto scores = hn::LoadU(d, row + lanes_from);
-    auto outer_here = outer(lanes_from);
-    auto left = hn::Max(outer(lanes_from - kSegments), hn::LoadU(d, row + lanes_from - kSegments));
+    auto outer_here = outer(start);
+    auto left = hn::Max(outer(start - kStep), hn::LoadU(d, row + (start - kStep)));
     auto here = hn::Max(outer_here, scores);
     for (std::size_t i = lanes_from; i < count; i += kSegments) {
       const auto next_scores = hn::LoadU(d, row + i + kSegments);
-      const auto outer_right = outer(i + kSegments);
+      const auto outer_right = outer(static_cast<std::ptrdiff_t>(i) + kStep);
       const auto right = hn::Max(outer_right, next_scores);
       const auto neighbours = hn::Max(outer_here, hn::Max(left, right));
       const auto is_maximum = hn::AndNot(hn::Lt(scores, floor), hn::Gt(scores, neighbours));
