@@ -1,5 +1,6 @@
 #include "host/effects/renderer.h"
 
+#include <algorithm>
 #include <memory>
 #include <new>
 #include <optional>
@@ -15,8 +16,11 @@ namespace calmframe::host {
 namespace {
 
 constexpr HX_Err kBadRequest = HX_ERR_UNKNOWN;
-// More than any frame; a plug-in that asks for it is at fault.
-constexpr int kLargestSide = 1 << 17;
+// More than any frame; a plug-in that asks for it is at fault, or what a file has told it.
+constexpr std::int64_t kLargestSide = 1 << 17;
+// As of a clip's frames. What is warped may reach beyond a layer, if not for ever.
+constexpr std::int64_t kMostPixels = std::int64_t{1} << 27;
+constexpr std::int64_t kMostLayers = 4;
 
 bool Serves(const RenderRequest& request, bool planned) {
   const bool depth =
@@ -55,9 +59,12 @@ std::shared_ptr<WorldBuffer> PartOf(Host& host, const std::shared_ptr<WorldBuffe
   return part;
 }
 
-bool IsAbsurd(const HX_Rect& rect) {
-  return std::int64_t{rect.right} - rect.left > kLargestSide ||
-         std::int64_t{rect.bottom} - rect.top > kLargestSide;
+bool IsAbsurd(const HX_Rect& rect, const RenderContext& frames) {
+  const std::int64_t width = std::int64_t{rect.right} - rect.left,
+                     height = std::int64_t{rect.bottom} - rect.top;
+  if (width > kLargestSide || height > kLargestSide) return true;
+  const std::int64_t most = std::max(kMostPixels, kMostLayers * frames.width() * frames.height());
+  return !IsEmpty(rect) && width * height > most;
 }
 
 }  // namespace
@@ -148,7 +155,7 @@ void Renderer::DrawDirect(const RenderRequest& request, RenderedFrame& rendered)
     rendered.full_rect = {static_cast<std::int32_t>(left), static_cast<std::int32_t>(top),
                           static_cast<std::int32_t>(left + setup.width),
                           static_cast<std::int32_t>(top + setup.height)};
-    if (IsAbsurd(rendered.full_rect)) {
+    if (IsAbsurd(rendered.full_rect, frames)) {
       rendered.result.code = kBadRequest;
     } else if (auto output = OutputFor(host_, rendered.full_rect, request.bit_depth)) {
       rendered.result = instance_->Call(HX_CMD_RENDER_FRAME, place, &output->world());
@@ -178,7 +185,7 @@ void Renderer::DrawPlanned(const RenderRequest& request, RenderedFrame& rendered
   rendered.full_rect = plan.full_rect;
   const HX_Rect wanted =
       plan.may_exceed ? plan.result_rect : Intersect(plan.result_rect, plan.request.rect);
-  if (IsAbsurd(wanted)) {
+  if (IsAbsurd(wanted, frames)) {
     rendered.result.code = kBadRequest;
     return;
   }

@@ -137,12 +137,25 @@ TEST_F(FaultsTest, AnswersThatMakeNoFrameAreErrors) {
     plan.may_exceed = 1;
     return HX_ERR_NONE;
   };
+  // 2^28 pixels.
+  const auto spread = [](const Call& call) {
+    call.out->width = call.out->height = 1 << 14;
+    return HX_ERR_NONE;
+  };
+  const auto flood = [](const Call& call) {
+    auto& plan = *static_cast<HX_PlanExtra*>(call.extra);
+    plan.result_rect = {0, 0, 1 << 14, 1 << 14};
+    plan.may_exceed = 1;
+    return HX_ERR_NONE;
+  };
+  const std::string unknown = "it: the plug-in answered " + std::to_string(HX_ERR_UNKNOWN);
   const struct {
     Deed prepare, plan;
     std::string line;
   } cases[] = {{Refuse, Refuse, "it: the plug-in answered 77"},
                {say, say, "it: No room."},
-               {grow, exceed, "it: the plug-in answered " + std::to_string(HX_ERR_UNKNOWN)}};
+               {grow, exceed, unknown},
+               {spread, flood, unknown}};
   for (const auto& c : cases) {
     on = {{HX_CMD_PREPARE_FRAME, c.prepare}, {HX_CMD_PLAN_FRAME, c.plan}};
     Start();
