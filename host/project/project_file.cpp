@@ -10,10 +10,12 @@
 #include <cstring>
 #include <filesystem>
 #include <functional>
+#include <limits>
 #include <type_traits>
 #include <vector>
 
 #include "host/media/clip_files.h"
+#include "host/media/frame_index.h"
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
 
@@ -111,6 +113,24 @@ Guid ChecksumOf(const Project& project, std::int64_t version) {
   mix(project.effect.instance.data(), project.effect.instance.size());
   if (version >= 3) mix(project.clip_frames.data(), project.clip_frames.size());
   return sum;
+}
+
+// Whatever a project tells, memory is taken for frames of this size and a span of so many, and no
+// time in ticks leaves 64 bits, which twice the span and a frame more must fit into.
+bool IsWithinRanges(const Project& project) {
+  constexpr auto kFrames = static_cast<std::int64_t>(media::kMaximumFrames);
+  const std::int64_t start = project.start_frame, length = project.length;
+  if (project.width < 0 || project.height < 0 ||
+      std::int64_t{project.width} * project.height > media::kMaximumPixels) {
+    return false;
+  }
+  if (start < -kFrames || start > kFrames || length < 0 || length > kFrames) return false;
+  const std::int64_t most =
+      std::numeric_limits<std::int64_t>::max() / (2 * (std::abs(start) + length + 1));
+  return project.ticks_per_frame > 0 && project.ticks_per_frame <= most &&
+         project.field_type >= HX_FIELD_PROGRESSIVE &&
+         project.field_type <= HX_FIELD_SECOND_ORDER && project.pixel_aspect.num > 0 &&
+         project.pixel_aspect.den != 0;
 }
 
 struct SettingWriter {
@@ -290,8 +310,7 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   }
   Guid checksum;
   SettingReader{setting}(kChecksum, checksum);
-  if (checksum != ChecksumOf(project, version) || project.ticks_per_frame <= 0 ||
-      project.pixel_aspect.num <= 0 || project.pixel_aspect.den == 0) {
+  if (checksum != ChecksumOf(project, version) || !IsWithinRanges(project)) {
     throw SqliteError(SQLITE_CORRUPT, kChecksum);
   }
   return project;

@@ -162,6 +162,39 @@ TEST_F(ProjectTest, DamageIsToldAndNeverMore) {
   }
 }
 
+TEST_F(ProjectTest, WhatNoClipOnALayerTellsIsDamage) {
+  const struct {
+    std::int32_t width, height, start_frame, length;
+    std::int64_t ticks;
+    std::int32_t field_type;
+    bool loads;
+  } cases[] = {{16384, 8192, -10000000, 10000000, 1, 2, true},
+               {16384, 8193, 0, 1, 1, 0, false},
+               {-1, -1, 0, 1, 1, 0, false},
+               {20, 20, 10000001, 0, 1, 0, false},
+               {20, 20, -10000001, 0, 1, 0, false},
+               {20, 20, 0, 10000001, 1, 0, false},
+               {20, 20, 0, -1, 1, 0, false},
+               {20, 20, 1, 2, (std::int64_t{1} << 60) - 1, 0, true},  // of four frames, twice
+               {20, 20, 1, 2, std::int64_t{1} << 60, 0, false},
+               {20, 20, 0, 1, 0, 0, false},
+               {20, 20, 0, 1, 1, 3, false},
+               {20, 20, 0, 1, 1, -1, false}};
+  for (const auto& c : cases) {
+    Project project = Sample(1, 10);
+    std::tie(project.width, project.height, project.start_frame, project.length,
+             project.ticks_per_frame, project.field_type) =
+        std::tie(c.width, c.height, c.start_frame, c.length, c.ticks, c.field_type);
+    SaveProject(In("ranges.calm"), project);
+    const auto load = [&] { LoadProject(In("ranges.calm")); };
+    if (c.loads) {
+      EXPECT_NO_THROW(load());
+    } else {
+      EXPECT_THAT(load, IsRefused("is damaged")) << &c - cases;
+    }
+  }
+}
+
 // Calls of SQLite that change files, until the one that the process does not live to see.
 int steps_left = 0;
 template <auto kCall, class... Args>
