@@ -5,7 +5,10 @@
 #include <string>
 
 #include "analysis/host/video_segment_render_suite_job.h"
+#include "analysis/src/rational_time.h"
+#include "analysis/src/read_job_input.h"
 #include "analysis/src/state_errors.h"
+#include "effect/host_text.h"
 #include "effect/suite.h"
 #include "platform/tessel/debug.h"
 #include "platform/tessel/filesupport.h"
@@ -86,10 +89,23 @@ void LoadInstance(const HostContext& context, FlattenedInstance kind, Stabilizer
   }
 }
 
+// A table has room for all frames from the start, of which a file may tell any number.
+bool IsLongerThanLayer(const HostContext& context, const analysis::JobInput& job) {
+  try {
+    return analysis::Compare(job.Duration,
+                             analysis::ReadJobInput(context.in, context.out).Duration) > 0;
+  } catch (...) {  // of the host's, which a start meets too
+    ClearMessage(context);
+    return false;
+  }
+}
+
 // A job runs, or has results, in the process that began it alone.
 void KeepJobThatCanGoOn(const HostContext& context, StabilizerState& state) {
-  if (!state.analyzer || state.analyzer->job_stage() == analysis::JobStage::NotStarted) return;
-  if (state.analyzer->CanGoOn()) {
+  if (!state.analyzer) return;
+  if (state.analyzer->job_stage() == analysis::JobStage::NotStarted) {
+    if (!IsLongerThanLayer(context, state.analyzer->record().job_input_parameters)) return;
+  } else if (state.analyzer->CanGoOn()) {
     state.first_analysis = true;
     return;
   }

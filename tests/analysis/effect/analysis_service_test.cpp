@@ -179,15 +179,17 @@ TEST(AnalysisServiceTest, ALayerWithoutFramesIsToldAndLeftAlone) {
   EXPECT_TRUE(hosted.Set(kDetailedAnalysis, 1).ok());
   EXPECT_EQ(hosted.Messages(), text);
   EXPECT_FALSE(hosted.Warp(3).empty());
-  // A job that is of no frames already.
-  hosted.Remove();
-  hosted.Place(0, 8);
-  hosted.Apply();
-  hosted.Open(hosted.Altered(hosted.Save(), [](SavedState& state) {
-    state.job->job_guid = tessel::utility::Guid::MakeUnique();
-    state.job->job_input_parameters.Duration.numerator = 0;
-  }));
-  EXPECT_EQ(hosted.Settle(), 1);
+  // A job that is of no frames already, and one of more than the layer shows, which does not begin.
+  for (const auto& [times, status] : {std::pair{0, 1}, {2, 0}}) {
+    hosted.Remove();
+    hosted.Place(0, 8);
+    hosted.Apply();
+    hosted.Open(hosted.Altered(hosted.Save(), [times = times](SavedState& state) {
+      state.job->job_guid = tessel::utility::Guid::MakeUnique();
+      state.job->job_input_parameters.Duration.numerator *= times;
+    }));
+    EXPECT_EQ(hosted.Settle(), status);
+  }
 }
 
 // What a project says of an analysis that waits is of that analysis alone.

@@ -4,6 +4,7 @@
 #include <limits>
 #include <type_traits>
 
+#include "analysis/effect/analysis_parameter_rows.h"
 #include "analysis/src/identities.h"
 #include "analysis/src/param_fields.h"
 #include "platform/tessel/serialization.h"
@@ -95,6 +96,24 @@ Params ReadParamsValue(const Value& object) {
   return params;
 }
 
+// An analysis takes memory and time by these. What no control can ask for is of no effect of ours.
+void ExpectAskedFor(const marrow::tracking::SelectorParams& selector,
+                    const marrow::tracking::TrackerParams& tracker) {
+  using namespace analysis::effect;
+  for (const auto& [value, control] : {std::pair{selector.max_count, kMaxCountParam},
+                                       {selector.half_winx, kSelectorXRadiusParam},
+                                       {selector.half_winy, kSelectorYRadiusParam},
+                                       {tracker.max_iterations, kMaxIterationsParam},
+                                       {tracker.pyramidal_levels, kPyramidalLevelsParam},
+                                       {tracker.half_win_x, kTrackerXRadiusParam},
+                                       {tracker.half_win_y, kTrackerYRadiusParam}}) {
+    const kelp::effect::ParameterRow& row = *AnalysisParameterRow(control);
+    if (value > static_cast<std::uint64_t>(row.valid.max)) {
+      throw tessel::serialization::WrongType(row.name.literal);
+    }
+  }
+}
+
 }  // namespace
 
 std::u16string JobInputText(const JobInput& input) {
@@ -125,6 +144,7 @@ AnalyzerRecord ParseJob(const std::u16string& text) {
       tessel::serialization::GetObject(object, "selector_params"));
   job.tracker_params = ReadParamsValue<marrow::tracking::TrackerParams>(
       tessel::serialization::GetObject(object, "tracker_params"));
+  ExpectAskedFor(job.selector_params, job.tracker_params);
   if (object.contains("job_stage")) {
     const auto stage = tessel::serialization::GetInteger<std::int32_t>(object, "job_stage");
     if (stage < 0 || stage > static_cast<std::int32_t>(JobStage::SeenEnded)) {
