@@ -8,9 +8,9 @@
 namespace calmframe {
 
 // Writes the clip's tracks to `path` by the effect's own button, which is one for experts. Returns
-// what the file holds, read back, since the button doesn't tell how it went. `work`, `file`: what the user calls the saved work and the file.
-// Throws SolveFailure where there are no tracks, media::Failure (output) where the file isn't
-// whole.
+// what the file holds, read back, since the button doesn't tell how it went. `work`, `file`: what
+// the user calls the saved work and the file. Throws SolveFailure where there are no tracks,
+// media::Failure (output) where the file isn't whole.
 report::TrackTable SaveTracks(SteadyClip& clip, const std::string& work, const std::string& path,
                               const std::string& file);
 
