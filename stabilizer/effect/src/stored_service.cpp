@@ -5,7 +5,7 @@
 #include <string>
 
 #include "analysis/host/video_segment_render_suite_job.h"
-#include "analysis/src/rational_time.h"
+#include "analysis/src/job_frame_source.h"
 #include "analysis/src/read_job_input.h"
 #include "analysis/src/state_errors.h"
 #include "effect/host_text.h"
@@ -89,12 +89,13 @@ void LoadInstance(const HostContext& context, FlattenedInstance kind, Stabilizer
   }
 }
 
-// A table has room for all frames from the start, of which a file may tell any number.
-bool IsLongerThanLayer(const HostContext& context, const analysis::JobInput& job) {
+// A table has room for all frames from the start, of which a file may tell any number: by its span,
+// and by a step as short as can be.
+bool HasMoreFramesThanLayer(const HostContext& context, const analysis::JobInput& job) {
   try {
-    return analysis::Compare(job.Duration,
-                             analysis::ReadJobInput(context.in, context.out).Duration) > 0;
-  } catch (...) {  // of the host's, which a start meets too
+    return analysis::GetRunFrames(job).frame_count >
+           analysis::GetRunFrames(analysis::ReadJobInput(context.in, context.out)).frame_count;
+  } catch (...) {  // of the host's, or of times that are none, which a start meets too
     ClearMessage(context);
     return false;
   }
@@ -104,7 +105,7 @@ bool IsLongerThanLayer(const HostContext& context, const analysis::JobInput& job
 void KeepJobThatCanGoOn(const HostContext& context, StabilizerState& state) {
   if (!state.analyzer) return;
   if (state.analyzer->job_stage() == analysis::JobStage::NotStarted) {
-    if (!IsLongerThanLayer(context, state.analyzer->record().job_input_parameters)) return;
+    if (!HasMoreFramesThanLayer(context, state.analyzer->record().job_input_parameters)) return;
   } else if (state.analyzer->CanGoOn()) {
     state.first_analysis = true;
     return;

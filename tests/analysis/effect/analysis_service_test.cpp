@@ -179,14 +179,15 @@ TEST(AnalysisServiceTest, ALayerWithoutFramesIsToldAndLeftAlone) {
   EXPECT_TRUE(hosted.Set(kDetailedAnalysis, 1).ok());
   EXPECT_EQ(hosted.Messages(), text);
   EXPECT_FALSE(hosted.Warp(3).empty());
-  // A job that is of no frames already, and one of more than the layer shows, which does not begin.
-  for (const auto& [times, status] : {std::pair{0, 1}, {2, 0}}) {
+  // A job that is of no frames already, and ones of more than the layer shows, which don't begin.
+  for (const auto& [times, steps, status] : {std::tuple{0, 1, 1}, {2, 1, 0}, {1, 2, 0}}) {
     hosted.Remove();
     hosted.Place(0, 8);
     hosted.Apply();
-    hosted.Open(hosted.Altered(hosted.Save(), [times = times](SavedState& state) {
+    hosted.Open(hosted.Altered(hosted.Save(), [times = times, steps = steps](SavedState& state) {
       state.job->job_guid = tessel::utility::Guid::MakeUnique();
       state.job->job_input_parameters.Duration.numerator *= times;
+      state.job->job_input_parameters.StepTime.denominator *= steps;
     }));
     EXPECT_EQ(hosted.Settle(), status);
   }

@@ -112,6 +112,14 @@ void ExpectAskedFor(const marrow::tracking::SelectorParams& selector,
       throw tessel::serialization::WrongType(row.name.literal);
     }
   }
+  // Each alone may be the most; together they would take many gigabytes of windows, three floats a
+  // pixel with a border of one. What the defaults call for takes a quarter of one at the most.
+  constexpr std::uint64_t kMostWindowBytes = std::uint64_t{1} << 29;
+  const std::uint64_t side = 2 * tracker.half_win_x + 3;
+  if (selector.max_count * tracker.pyramidal_levels * side * side * 3 * sizeof(float) >
+      kMostWindowBytes) {
+    throw tessel::serialization::WrongType("windows");
+  }
 }
 
 }  // namespace
