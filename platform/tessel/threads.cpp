@@ -8,6 +8,7 @@
 #include <condition_variable>
 #include <list>
 #include <mutex>
+#include <new>
 #include <thread>
 #include <utility>
 
@@ -113,9 +114,21 @@ LiveThreads& live_threads() {
   return threads;
 }
 
+// The pool's threads are told to leave when the last thread that used it ends, and nobody waits for
+// them: they could still be on their way out when the library is unloaded, or at the process's end.
+// The pool comes back with the next loop. Where another thread is still at a loop this waits for
+// nothing.
+void EndLoopThreads() {
+  tbb::task_scheduler_handle pool{tbb::attach{}};
+  tbb::finalize(pool, std::nothrow);
+}
+
 // What has ended is joined at the process's end, too, where nobody shut down.
 struct JoinAtExit {
-  ~JoinAtExit() { live_threads().JoinEnded(); }
+  ~JoinAtExit() {
+    live_threads().JoinEnded();
+    EndLoopThreads();
+  }
 };
 const JoinAtExit join_at_exit;
 
@@ -140,6 +153,7 @@ void Shutdown() {
   internal::BeginEndingPooledThreads();
   live_threads().WaitForNone();
   internal::FinishEndingPooledThreads();
+  EndLoopThreads();
 }
 
 namespace internal {

@@ -6,6 +6,8 @@
 #include <boost/function.hpp>
 #include <boost/shared_ptr.hpp>
 #include <chrono>
+#include <filesystem>
+#include <iterator>
 #include <memory>
 #include <stdexcept>
 #include <string>
@@ -174,6 +176,26 @@ TEST(ExecutorPoolTest, ShutdownWaitsForLongComputationsAndForTheirRemains) {
     Shutdown();
     ASSERT_EQ(*remains, 1);
     ASSERT_EQ(remains.use_count(), 1);
+  }
+}
+
+// A library whose code they could still be in may be unloaded then.
+TEST(LoopThreadsTest, ShutdownLeavesNoneAndTheNextLoopRuns) {
+  const auto threads = [] {
+    const std::filesystem::directory_iterator begin("/proc/self/task");
+    return std::distance(begin, {});
+  };
+  const auto before = threads();  // a sanitizer's
+  for (int round = 0; round < kRounds; ++round) {
+    std::atomic<int> runs = 0;
+    ExecuteCPUBoundTaskOnAllProcessors([&](std::size_t) { ++runs; }, 100);
+    ASSERT_EQ(runs, 100);
+    Shutdown();
+    // One that was joined is listed a moment longer.
+    for (int wait = 0; threads() > before && wait < 5000; ++wait) {
+      std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    ASSERT_EQ(threads(), before);
   }
 }
 
