@@ -14,13 +14,15 @@ Guid IdentifierWithoutPath(JobInput input) {
   return GetIdentifierForJobInput(input);
 }
 
-bool FitsSource(AnalysisState& state, const PresentInputs& present) {
+// Current or OtherSource. A host that has no clip to show now can't tell.
+Validity ComparedSource(AnalysisState& state, const PresentInputs& present) {
   const Guid stored = state.result->source_identity;
   const Guid first = present.source_identity();
-  if (first == stored) return true;
-  if (present.source_identity() != stored) return false;
+  if (first == stored) return Validity::Current;
+  if (first.IsNil()) return Validity::Unknown;
+  if (present.source_identity() != stored) return Validity::OtherSource;
   Replace(state.result, [&first](AnalysisResult& next) { next.source_identity = first; });
-  return true;
+  return Validity::Current;
 }
 
 Validity Compared(AnalysisState& state, const PresentInputs& present) {
@@ -31,7 +33,8 @@ Validity Compared(AnalysisState& state, const PresentInputs& present) {
   const bool same_tracker =
       stored->tracker_identity.IsNil() || present.tracker_identity() == stored->tracker_identity;
   if (stored->source_identity.IsNil()) return Validity::Stale;
-  if (!FitsSource(state, present)) return Validity::OtherSource;
+  const Validity source = ComparedSource(state, present);
+  if (source != Validity::Current) return source;
   return same_span && same_tracker ? Validity::Current : Validity::Stale;
 }
 

@@ -48,15 +48,21 @@ TEST(AnalysisServiceTest, OfALayerThatBeginsBeforeItsMediaTheMediaIsAnalysed) {
 TEST(AnalysisServiceTest, WhatCantBeLearntUpstreamOffersAnalyzeAndIsNoError) {
   HostedEffect hosted(SmallClip());
   ASSERT_EQ(hosted.Analyse(), 8);
-  hosted.host().media().faults.identifier_failed = true;
+  calmframe::host::MediaFaults& faults = hosted.host().media().faults;
+  const auto expect_faults_pass = [&] {
+    EXPECT_TRUE(hosted.Tick().ok());
+    ExpectButtons(hosted, true, false);
+    EXPECT_EQ(hosted.Status(), 8) << "it is the user's to press";
+    faults.identifier_failed = faults.node_missing = false;
+    Operations::Get().FailNone();
+    EXPECT_TRUE(hosted.Tick().ok());
+    ExpectButtons(hosted, false, false);
+  };
+  faults.identifier_failed = true;
   Operations::Get().FailAlways("Video Segment.GetNodeGuid");
-  EXPECT_TRUE(hosted.Tick().ok());
-  ExpectButtons(hosted, true, false);
-  EXPECT_EQ(hosted.Status(), 8) << "it is the user's to press";
-  hosted.host().media().faults.identifier_failed = false;
-  Operations::Get().FailNone();
-  EXPECT_TRUE(hosted.Tick().ok());
-  ExpectButtons(hosted, false, false);
+  expect_faults_pass();
+  faults.node_missing = true;
+  expect_faults_pass();
   EXPECT_TRUE(hosted.Messages().empty());
 }
 

@@ -74,7 +74,8 @@ TEST_F(ValidityTest, SpanFieldsParametersAndSourceCountAndThePathDoesNot) {
   layer().Change([&](LayerState& l) { l = before; });
   Stored([](AnalysisResult& result) { result.tracker_identity = {}; });  // of an old project
   EXPECT_TRUE(Current());
-  media().faults.node_missing = true;  // a source that can't be told is like no other
+  media().faults.node_missing = true;
+  EXPECT_EQ(Found(), Validity::Unknown);
   Stored([](AnalysisResult& result) { result.source_identity = {}; });
   EXPECT_FALSE(Current());
   Stored([](AnalysisResult& result) { result.all_features.frame_count = 0; });
