@@ -82,9 +82,10 @@ class PlayedPlugin : public testing::Test {
   // work that a host takes to be under way for ever, since its status could not be told.
   void Bring(Effect& effect, std::chrono::milliseconds patience = 5min) {
     session_->TickUntilSettled(patience);
-    if (Enabled(effect, kAnalyze)) {
-      EXPECT_TRUE(effect.Press(kAnalyze).ok());
-    }
+    const auto press = [&] { EXPECT_TRUE(effect.Press(kAnalyze).ok()); };
+    if (Enabled(effect, kAnalyze)) press();
+    // An analysis that outlived the patience is of what stood beneath the effect when it began.
+    if (Settle(effect) != kReady && Enabled(effect, kAnalyze)) press();
     EXPECT_EQ(Settle(effect), kReady);
     EXPECT_TRUE(effect.MakeRenderer()->Planned({3}).pixels);
   }
