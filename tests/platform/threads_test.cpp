@@ -269,6 +269,7 @@ TEST(ThreadsTest, PostedTasksDoNotWaitForEachOther) {
     first.reset();  // a waiter may destroy the event
     EXPECT_EQ(result, 1);
   }
+  Shutdown();  // both tasks have signalled, and may be at work yet
 }
 
 }  // namespace
