@@ -1,0 +1,100 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <stdexcept>
+#include <vector>
+
+// What a solved effect remembers, for programs that look at its warps or change what they show. The
+// bytes are told in docs/state_format.md.
+//
+// All planes below are in square pixels, x to the right, y downwards, the origin in the centre of
+// the top left pixel. The stabilized plane is where the warps put the frames; the output frame is
+// as large as a frame.
+namespace calmframe::host {
+
+struct Point {
+  double x = 0, y = 0;
+
+  bool operator==(const Point&) const = default;
+};
+
+// (x, y) -> (a x - b y + dx, b x + a y + dy): scale and angle in a + ib, then a shift in pixels.
+struct Similarity {
+  double a = 1, b = 0, dx = 0, dy = 0;
+
+  Point operator()(Point p) const { return {a * p.x - b * p.y + dx, b * p.x + a * p.y + dy}; }
+};
+
+// Not finite where a and b are 0.
+Similarity Inverse(const Similarity& m);
+
+struct SolvedClip {
+  int source_width = 0, source_height = 0;  // of a frame, in its own pixels
+  int width = 0, height = 0;                // the same in square pixels
+  // Row 0 of all below is this frame of the source; both count fields where the source is
+  // interlaced.
+  int first_frame = 0;
+  int frame_count = 0;  // at least 1
+
+  // Vertices of a warp's grid, at least 2 each. They stand evenly over the frame, the outermost on
+  // its first and last pixel centres.
+  int columns = 0, rows = 0;
+  // By frame, row, column: where each lands in the stabilized plane, before crop and scale. A frame
+  // without a solution has zeros. From a file they may be any number, and none.
+  std::vector<Point> vertices;
+
+  // Places for tracks in a frame, at least 1. By frame and slot: where the track is, in the
+  // source's own pixels, centres at whole numbers; and what it is: n > 0 a track that begins here,
+  // in row n - 1; 0 one that goes on; below 0 none here, and the position means nothing.
+  int slots = 0;
+  std::vector<Point> tracks;
+  std::vector<std::int32_t> statuses;
+
+  // The effect's own framing. `left` to `bottom` from `origin`, both ends included.
+  struct Window {
+    float left, top, right, bottom;
+  };
+  struct Crop {
+    int width = 0, height = 0;    // of all windows; not above 0: the frames have nothing in common
+    Point origin;                 // in the stabilized plane
+    std::vector<Window> windows;  // none or one a frame
+  };
+  std::optional<Crop> crop;
+};
+
+// An instance is none of a solved effect, of another version, or damaged.
+class NoSolvedClip : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
+// Of a flattened instance, as SavedEffect has it. Throws NoSolvedClip; of counts no memory is taken
+// before the bytes are there.
+SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance);
+
+// The instance of an effect that shows, of each frame, what windows[frame] tells: it takes points
+// of the output frame to the stabilized plane. What the instance holds besides stays, byte by byte,
+// so that nothing is analysed, solved or framed anew as long as it is loaded with the values that
+// it was saved with. Only the additional scale must be 100 %.
+//
+// A framing that crops (2 and 3) then shows the output frame, whole, at scale 1: point (x, y) of it
+// is that pixel, in a source of other than square pixels that place of the picture. The instance
+// must have been saved with its crop done, under that framing: from another one the effect finds
+// its own crop again, and the windows' pictures in it.
+//
+// A framing that does not crop (1 and 4) shows the whole plane about its middle; see
+// ShiftWithoutCrop. Neighbours that fill the edges go with their frame.
+//
+// Vertices are rounded to 1/256 pixel of the output frame. Throws NoSolvedClip as above, and
+// std::invalid_argument where the windows are not one a frame, or one has no inverse.
+std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
+                                      const std::vector<Similarity>& windows);
+
+// How far a framing that does not crop, at full render scale and 100 %, puts every picture from
+// where it belongs, to the right and downwards, in the source's own pixels. It is the same for all
+// frames of the clip, and that of the windows does not go into it: the effect centres the bounds of
+// all frames' outlines, and moving all windows moves these too.
+Point ShiftWithoutCrop(const SolvedClip& clip);
+
+}  // namespace calmframe::host
