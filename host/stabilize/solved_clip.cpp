@@ -319,23 +319,29 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
 }
 
 Point ShiftWithoutCrop(const SolvedClip& clip) {
+  if (!clip.crop || clip.crop->windows.empty())
+    throw std::invalid_argument("a clip without a crop");
   const auto columns = static_cast<std::size_t>(clip.columns);
   const auto rows = static_cast<std::size_t>(clip.rows);
   Bounds bounds;
   for (std::size_t at = 0; at < clip.vertices.size(); at += columns * rows) {
     bounds.Add(clip.vertices.data() + at, columns, rows);
   }
+  const SolvedClip::Window& shown = clip.crop->windows.front();
   // Along one axis: the bounds' least goes to the left end of a buffer that the frame lies in the
-  // middle of, by whole pixels. Without that the middles of plane and frame would meet.
-  const auto shift = [](double least, double most, int square, int pixels) {
+  // middle of, by whole pixels. With a crop the middles of the window and the frame meet.
+  const auto shift = [](double least, double most, float first, float last, int square,
+                        int pixels) {
     const double scale = static_cast<float>(static_cast<double>(pixels) / square);
     const double side = std::ceil(Tame((most - least) * scale));
     const double before = std::trunc((side - pixels) / 2);
-    const double origin = (pixels - 1) / 2.0 - (square - 1) / 2.0 * scale;
-    return -least * scale - before - origin;
+    const double middle = least + (static_cast<double>(first) + last) / 2;
+    return -least * scale - before - ((pixels - 1) / 2.0 - middle * scale);
   };
-  return {shift(bounds.least.x, bounds.most.x, clip.width, clip.source_width),
-          shift(bounds.least.y, bounds.most.y, clip.height, clip.source_height)};
+  return {
+      shift(bounds.least.x, bounds.most.x, shown.left, shown.right, clip.width, clip.source_width),
+      shift(bounds.least.y, bounds.most.y, shown.top, shown.bottom, clip.height,
+            clip.source_height)};
 }
 
 }  // namespace calmframe::host
