@@ -82,13 +82,10 @@ class SolvedClipTest : public PlayedPlugin {
                          (w.top + w.bottom) / 2.0 + crop.origin.y - step * (clip.height - 1) / 2});
     }
     const auto own = played.effect->MakeRenderer(), other = Moved(played, windows).MakeRenderer();
-    for (const std::int64_t frame : {0, 5, 12}) {
-      RenderRequest request{frame, 32};
-      request.second_field = frame == 5 && c.field_type != HX_FIELD_PROGRESSIVE;
+    for (RenderRequest request : {RenderRequest{5, 32}, {12, 8}}) {
+      request.second_field = c.field_type != HX_FIELD_PROGRESSIVE;
       EXPECT_LT(Difference(*own->Planned(request).pixels, *other->Planned(request).pixels, 20),
-                0.01);
-      request.bit_depth = 8;
-      EXPECT_LT(Difference(*own->Direct(request).pixels, *other->Direct(request).pixels, 20), 0.05);
+                request.bit_depth == 8 ? 0.05 : 0.01);
     }
   }
 };
@@ -124,9 +121,11 @@ void ExpectCells(const SolvedClip& clip, int row, const Similarity& window, Poin
     const double v = ((y - p.y) * du.x - (x - p.x) * du.y) / determinant;
     const double from_x = (c + u) * (width - 1) / (clip.columns - 1) - 0.5;
     const double from_y = (r + v) * (height - 1) / (clip.rows - 1) - 0.5;
-    if (std::min(from_x, from_y) < 2 || from_x > width - 3 || from_y > height - 3) continue;
+    const bool rim = std::min(from_x, from_y) < 2 || from_x > width - 3 || from_y > height - 3;
     const HX_Pixel8& pixel = picture.row<HX_Pixel8>(y)[x];
-    ASSERT_EQ(pixel.alpha, 255) << x << ", " << y;
+    // The effect's own rim is up to a pixel off in others than square ones.
+    ASSERT_TRUE(pixel.alpha == 255 || (rim && width != clip.width)) << x << ", " << y;
+    if (rim) continue;
     worst = std::max(worst, std::abs(pixel.red - Sample(source, from_x, from_y)));
     ++compared;
   }
@@ -207,30 +206,33 @@ std::size_t After(const Bytes& bytes, const std::string& marker) {
   return static_cast<std::size_t>(found - bytes.begin()) + 4;
 }
 
-// The trapezoid of half the width below, y = 180 v / (1 + v), turned and stretched, which is stored
-// by its corners' projective map, and back, which is stored about an affine one.
+// A keystone whose corners are a parallelogram in y, so that it is stored about an affine map, and
+// turned, where it is stored by its projective one.
 TEST_F(SolvedClipTest, PerspectiveWarps) {
-  const Played played = Play({"perspective", 2, 1});
+  Played played = Play({"perspective", 2, 1});
   const Similarity turn = {1, 1, 0, 0};
-  const Windows still(16), turned(16, turn);
-  Bytes bytes = WithWindows(played.saved.instance, still);
-  const Point corners[] = {turn({0, 0}), turn({160, 0}), turn({40, 90}), turn({120, 90})};
+  const auto keystone = [](double u, double v) {
+    const double w = 1 + 0.25 * u + 0.6 * v;
+    return Point{(160 * u + 30 * v) / w, 110 * (v - 0.3125 / 0.96 * u) / w + 40};
+  };
+  Bytes& bytes = played.saved.instance;
+  bytes = WithWindows(bytes, Windows(16));
+  const Point corners[] = {turn(keystone(0, 0)), turn(keystone(1, 0)), turn(keystone(0, 1)),
+                           turn(keystone(1, 1))};
   const std::size_t mesh = After(bytes, "hseM") + 8;
   std::memset(bytes.data() + mesh, 0, sizeof corners + played.clip.columns * played.clip.rows * 8);
   std::memcpy(bytes.data() + mesh, corners, sizeof corners);
-  const SolvedClip first = ReadSolvedClip(bytes), back = ReadSolvedClip(WithWindows(bytes, turned));
-  for (int i = 0; i < first.columns * first.rows; ++i) {
-    const double u = i % first.columns / (first.columns - 1.0);
-    const double v = i / first.columns / (first.rows - 1.0);
-    const Point p = {80 + (u - 0.5) * 160 / (1 + v), 180 * v / (1 + v)}, q = turn(p);
-    ASSERT_NEAR(std::hypot(first.vertices[i].x - q.x, first.vertices[i].y - q.y), 0, 1e-9) << i;
-    ASSERT_NEAR(std::hypot(back.vertices[i].x - p.x, back.vertices[i].y - p.y), 0, 0.003) << i;
+  const SolvedClip turned = ReadSolvedClip(bytes);
+  const SolvedClip back = ReadSolvedClip(WithWindows(bytes, Windows(16, turn)));
+  for (int i = 0; i < turned.columns * turned.rows; ++i) {
+    const Point p = keystone(i % turned.columns / (turned.columns - 1.0),
+                             i / turned.columns / (turned.rows - 1.0));
+    const Point q = turn(p), a = turned.vertices[i], b = back.vertices[i];
+    ASSERT_NEAR(std::hypot(a.x - q.x, a.y - q.y), 0, 1e-9) << i;
+    ASSERT_NEAR(std::hypot(b.x - p.x, b.y - p.y), 0, 0.003) << i;
   }
-  SavedEffect saved = played.saved;
-  saved.instance = bytes;
-  // As the effect sees it too.
-  Effect& effect = Moved({played.other_layer, played.effect, saved, first}, turned);
-  ExpectCells(first, 0, turn, {}, *SourceFrame(effect, 0),
+  Effect& effect = Moved(played, Windows(16, turn));  // which sees it so too
+  ExpectCells(turned, 0, turn, {}, *SourceFrame(effect, 0),
               *effect.MakeRenderer()->Planned({0}).OnLayer());
 }
 
