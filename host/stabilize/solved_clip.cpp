@@ -319,8 +319,9 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
 }
 
 Point ShiftWithoutCrop(const SolvedClip& clip) {
-  if (!clip.crop || clip.crop->windows.empty())
-    throw std::invalid_argument("a clip without a crop");
+  if (!clip.crop || clip.crop->windows.empty()) {
+    throw std::invalid_argument("a clip without windows");
+  }
   const auto columns = static_cast<std::size_t>(clip.columns);
   const auto rows = static_cast<std::size_t>(clip.rows);
   Bounds bounds;

@@ -75,26 +75,29 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance);
 
 // The instance of an effect that shows, of each frame, what windows[frame] tells: it takes points
 // of the output frame to the stabilized plane. What the instance holds besides stays, byte by byte,
-// so that nothing is analysed, solved or framed anew as long as it is loaded with the values that
-// it was saved with. Only the additional scale must be 100 %.
+// so that nothing is analysed, solved or framed anew where it is loaded, on a layer of the same
+// source, with the values that it was saved with. Only the additional scale must be 100 %.
 //
-// A framing that crops (2 and 3) then shows the output frame, whole, at scale 1: point (x, y) of it
-// is that pixel, in a source of other than square pixels that place of the picture. The instance
-// must have been saved with its crop done, under that framing: from another one the effect finds
-// its own crop again, and the windows' pictures in it.
+// A framing that crops (2 and 3) then shows the output frame, whole, at scale 1. The instance must
+// have been saved under the very framing and maximum scale that it is loaded with: otherwise the
+// effect takes what it shows for the plane, and finds a crop of its own there.
 //
 // A framing that does not crop (1 and 4) shows the whole plane about its middle; see
 // ShiftWithoutCrop. Neighbours that fill the edges go with their frame.
 //
-// Vertices are rounded to 1/256 pixel of the output frame. Throws NoSolvedClip as above, and
-// std::invalid_argument where the windows are not one a frame, or one has no inverse.
+// Vertices are rounded to 1/256 pixel of the output frame. For the effect's sake the plane of the
+// new instance may lie some whole pixels to the left of the output frame, and above; its crop's
+// windows are the output frame. Throws NoSolvedClip as above, and std::invalid_argument where the
+// windows are not one a frame, or one has no inverse.
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
                                       const std::vector<Similarity>& windows);
 
-// How far a framing that does not crop, at full render scale and 100 %, puts every picture from
-// where it belongs, to the right and downwards, in the source's own pixels. It is the same for all
-// frames of the clip, and that of the windows does not go into it: the effect centres the bounds of
-// all frames' outlines, and moving all windows moves these too.
+// How far from its place in the output frame a framing that does not crop shows every picture, to
+// the right and downwards, in the source's own pixels, at full render scale and 100 %; of a clip
+// that was read from what WithWindows made. It is the same for all frames: the effect centres the
+// bounds of all frames' outlines, and rounds that to whole pixels for the place of the frame in its
+// buffer. No windows can undo it, since what moves them all moves the bounds too. Throws
+// std::invalid_argument for a clip without windows.
 Point ShiftWithoutCrop(const SolvedClip& clip);
 
 }  // namespace calmframe::host

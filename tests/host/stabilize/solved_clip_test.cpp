@@ -153,10 +153,22 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
     if (clip.crop) ExpectOwnPicture(played, c);
     if (fields) continue;
 
-    // The camera's place, as MakeShakyClip has it.
-    const int frame = kRow + c.start;
-    const Point camera = {kTremor * (1.5 * frame + 5.0 * std::sin(2.1 * frame)),
-                          kTremor * (4.0 * std::sin(1.7 * frame + 1.0))};
+    // As MakeShakyClip has it; tracks stand still in its scene.
+    const auto camera_at = [&](int row) {
+      const double t = row + c.start;
+      return Point{kTremor * (1.5 * t + 5.0 * std::sin(2.1 * t)),
+                   kTremor * (4.0 * std::sin(1.7 * t + 1.0))};
+    };
+    const Point camera = camera_at(kRow), before = camera_at(kRow - 1);
+    int still = 0, tracked = 0;
+    for (int i = kRow * clip.slots; i < (kRow + 1) * clip.slots; ++i) {
+      if (clip.statuses[i] != 0) continue;
+      const Point p = clip.tracks[i], q = clip.tracks[i - clip.slots];
+      still += std::hypot(p.x + camera.x - q.x - before.x, p.y + camera.y - q.y - before.y) < 0.2;
+      ++tracked;
+    }
+    EXPECT_GT(tracked, 50);
+    EXPECT_GT(still, tracked * 0.9);
     const Point corner = clip.vertices[kRow * clip.columns * clip.rows];
     const double aspect = clip.width / static_cast<double>(clip.source_width);
     for (const double scale : {0.8, 1.2, 2.0}) {  // the last leaves a rim of nothing all around
@@ -171,7 +183,8 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
       const Point shift =
           synthesized ? ShiftWithoutCrop(ReadSolvedClip(Saved(moved).instance)) : Point{};
       const auto picture = moved.MakeRenderer()->Planned({kRow}).OnLayer();
-      ExpectCells(clip, kRow, windows[kRow], shift, *SourceFrame(*played.effect, frame), *picture);
+      ExpectCells(clip, kRow, windows[kRow], shift, *SourceFrame(*played.effect, kRow + c.start),
+                  *picture);
       // Beside the frame neighbours show what the camera saw then, or nothing does.
       double sum = 0;
       int filled = 0;
