@@ -90,15 +90,6 @@ class SolvedClipTest : public PlayedPlugin {
   }
 };
 
-double Sample(const WorldBuffer& source, double x, double y) {
-  x = std::clamp(x, 0.0, source.world().width - 1.001);
-  y = std::clamp(y, 0.0, source.world().height - 1.001);
-  const int i = static_cast<int>(x), j = static_cast<int>(y);
-  const HX_Pixel8 *above = source.row<HX_Pixel8>(j) + i, *below = source.row<HX_Pixel8>(j + 1) + i;
-  return std::lerp(std::lerp(above[0].red, above[1].red, x - i),
-                   std::lerp(below[0].red, below[1].red, x - i), y - j);
-}
-
 // One pixel of each cell of a frame's warp must show its place in the source. Cells are so small
 // that three corners tell the map. shift: of the whole picture, in the source's pixels.
 void ExpectCells(const SolvedClip& clip, int row, const Similarity& window, Point shift,
@@ -126,7 +117,12 @@ void ExpectCells(const SolvedClip& clip, int row, const Similarity& window, Poin
     // The effect's own rim is up to a pixel off in others than square ones.
     ASSERT_TRUE(pixel.alpha == 255 || (rim && width != clip.width)) << x << ", " << y;
     if (rim) continue;
-    worst = std::max(worst, std::abs(pixel.red - Sample(source, from_x, from_y)));
+    const int i0 = static_cast<int>(from_x), j0 = static_cast<int>(from_y);
+    const HX_Pixel8 *above = source.row<HX_Pixel8>(j0) + i0,
+                    *below = source.row<HX_Pixel8>(j0 + 1) + i0;
+    const double red = std::lerp(std::lerp(above[0].red, above[1].red, from_x - i0),
+                                 std::lerp(below[0].red, below[1].red, from_x - i0), from_y - j0);
+    worst = std::max(worst, std::abs(pixel.red - red));
     ++compared;
   }
   EXPECT_LT(worst, 1.5);  // two roundings, and the cells' fourth corners
