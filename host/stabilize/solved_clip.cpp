@@ -224,12 +224,6 @@ std::vector<Similarity> Inverses(const std::vector<Similarity>& windows) {
 
 }  // namespace
 
-Similarity Inverse(const Similarity& m) {
-  const double square = m.a * m.a + m.b * m.b;
-  const double a = m.a / square, b = -m.b / square;
-  return {a, b, b * m.dy - a * m.dx, -(b * m.dx + a * m.dy)};
-}
-
 SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
   const SolvedPayload payload = ReadPayload(instance);
   const SolvedLayout& layout = payload.layout;

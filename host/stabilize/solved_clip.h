@@ -5,6 +5,8 @@
 #include <stdexcept>
 #include <vector>
 
+#include "host/stabilize/similarity.h"
+
 // What a solved effect remembers, for programs that look at its warps or change what they show. The
 // bytes are told in docs/state_format.md.
 //
@@ -12,22 +14,6 @@
 // the top left pixel. The stabilized plane is where the warps put the frames; the output frame is
 // as large as a frame.
 namespace calmframe::host {
-
-struct Point {
-  double x = 0, y = 0;
-
-  bool operator==(const Point&) const = default;
-};
-
-// (x, y) -> (a x - b y + dx, b x + a y + dy): scale and angle in a + ib, then a shift in pixels.
-struct Similarity {
-  double a = 1, b = 0, dx = 0, dy = 0;
-
-  Point operator()(Point p) const { return {a * p.x - b * p.y + dx, b * p.x + a * p.y + dy}; }
-};
-
-// Not finite where a and b are 0.
-Similarity Inverse(const Similarity& m);
 
 struct SolvedClip {
   int source_width = 0, source_height = 0;  // of a frame, in its own pixels

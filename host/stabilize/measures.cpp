@@ -1,0 +1,80 @@
+#include "host/stabilize/measures.h"
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <cstddef>
+
+namespace calmframe::host {
+namespace {
+
+constexpr int kPlaces = 5;      // in a row, and in a column
+constexpr double kReach = 0.6;  // seconds
+
+// What the middle of a least squares parabola through 2 reach + 1 values is made of.
+std::vector<double> ParabolaWeights(std::ptrdiff_t reach) {
+  const double m = 2.0 * static_cast<double>(reach) + 1;
+  std::vector<double> weights;
+  for (std::ptrdiff_t i = -reach; i <= reach; ++i) {
+    const auto at = static_cast<double>(i);
+    weights.push_back((3 * m * m - 7 - 20 * at * at) / 4 / (m * (m * m - 4) / 3));
+  }
+  return weights;
+}
+
+}  // namespace
+
+Shake MeasureShake(const ShownMotion& shown, double frames_per_second) {
+  const auto frames = static_cast<std::ptrdiff_t>(shown.motions.size());
+  auto reach = std::max<std::ptrdiff_t>(3, std::lround(kReach * frames_per_second));
+  if (frames < 2 * reach + 1) reach = std::max<std::ptrdiff_t>(2, (frames - 1) / 2);
+  if (frames < 2 * reach + 1) return {};
+  const std::vector<double> weights = ParabolaWeights(reach);
+  std::vector<std::array<double, kPlaces * kPlaces>> of_places(
+      static_cast<std::size_t>(frames - 2 * reach));
+  std::vector<Point> path(static_cast<std::size_t>(frames));
+  for (std::size_t place = 0; place < kPlaces * kPlaces; ++place) {
+    const Point at{shown.width * (static_cast<double>(place % kPlaces) / (kPlaces - 1) - 0.5),
+                   shown.height * (static_cast<double>(place / kPlaces) / (kPlaces - 1) - 0.5)};
+    for (std::size_t f = 1; f < path.size(); ++f) {
+      const Point before = shown.motions[f](at);
+      path[f] = {path[f - 1].x + at.x - before.x, path[f - 1].y + at.y - before.y};
+    }
+    for (std::size_t f = 0; f < of_places.size(); ++f) {
+      const std::size_t middle = f + static_cast<std::size_t>(reach);
+      Point off = path[middle];
+      for (std::size_t i = 0; i < weights.size(); ++i) {
+        off.x -= weights[i] * path[f + i].x;
+        off.y -= weights[i] * path[f + i].y;
+      }
+      of_places[f][place] = std::hypot(off.x, off.y) * 1000 / shown.width;
+    }
+  }
+  std::vector<double> shakes;
+  for (auto& places : of_places) {
+    const auto middle = places.begin() + places.size() / 2;
+    std::nth_element(places.begin(), middle, places.end());
+    shakes.push_back(*middle);
+  }
+  Shake shake;
+  const auto second = std::clamp<std::size_t>(
+      static_cast<std::size_t>(std::lround(frames_per_second)), 1, shakes.size());
+  double sum = 0;
+  for (std::size_t f = 0; f < shakes.size(); ++f) {
+    shake.mean += shakes[f] / static_cast<double>(shakes.size());
+    sum += shakes[f];
+    if (f + 1 < second) continue;
+    if (f >= second) sum -= shakes[f - second];
+    const double mean = sum / static_cast<double>(second);
+    if (mean <= shake.worst) continue;
+    shake.worst = mean;
+    shake.worst_at = (static_cast<double>(f + static_cast<std::size_t>(reach)) -
+                      static_cast<double>(second - 1) / 2) /
+                     frames_per_second;
+  }
+  std::sort(shakes.begin(), shakes.end());
+  shake.p95 = shakes[std::min(shakes.size() - 1, shakes.size() * 19 / 20)];
+  return shake;
+}
+
+}  // namespace calmframe::host

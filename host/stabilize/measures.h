@@ -1,0 +1,30 @@
+#pragma once
+
+#include <vector>
+
+#include "host/stabilize/similarity.h"
+
+namespace calmframe::host {
+
+// How the background moves over the output, and how much of the source that shows.
+struct ShownMotion {
+  double width = 0, height = 0;  // of the output, square pixels
+  // Takes a background point of a frame to its place in the frame before, pixels about the output's
+  // middle; of the first frame without meaning.
+  std::vector<Similarity> motions;
+  std::vector<double> zooms;  // how many times enlarged each frame shows the source
+};
+
+// Motion that is faster than about 0.9 Hz, in pixels of a picture 1000 wide: how far the path of
+// each of 5 x 5 places is from its local quadratic over 0.6 s to either side (Savitzky and Golay,
+// Analytical Chemistry 36, 1964); of a frame the median over the places. All 0 for clips of fewer
+// than five frames.
+struct Shake {
+  double mean = 0;      // over the frames
+  double p95 = 0;       // that a twentieth of the frames exceed
+  double worst = 0;     // mean of the worst second
+  double worst_at = 0;  // its middle, in seconds from the first frame
+};
+Shake MeasureShake(const ShownMotion& shown, double frames_per_second);
+
+}  // namespace calmframe::host

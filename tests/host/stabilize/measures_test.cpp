@@ -1,0 +1,68 @@
+#include "host/stabilize/measures.h"
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <functional>
+#include <numbers>
+
+namespace calmframe::host {
+namespace {
+
+constexpr double kRate = 30, kWidth = 500;
+
+// Ten seconds in which the background's place is at(seconds), in pixels.
+ShownMotion Moving(const std::function<double(double)>& at) {
+  ShownMotion shown{kWidth, 300, {}, {}};
+  for (int f = 0; f < 300; ++f) {
+    shown.motions.push_back({1, 0, at((f - 1) / kRate) - at(f / kRate), 0});
+  }
+  return shown;
+}
+
+double Wave(double hertz, double seconds) {
+  return std::sin(2 * std::numbers::pi * hertz * seconds);
+}
+
+// Of a sine the mean size is 2/pi of its height, and a twentieth lies above sin(85.5 degrees) of
+// it; pixels count double in a picture half of 1000 wide.
+TEST(MeasureShakeTest, TakesWhatIsFastInThousandthsOfTheWidth) {
+  const Shake fast = MeasureShake(Moving([](double s) { return 4 * Wave(11.3, s); }), kRate);
+  EXPECT_NEAR(fast.mean, 8 * 2 / std::numbers::pi, 0.25);
+  EXPECT_NEAR(fast.p95, 8, 0.25);
+  const Shake slow = MeasureShake(Moving([](double s) { return 40 * Wave(0.15, s); }), kRate);
+  EXPECT_LT(slow.mean, 0.4);
+  const Shake pan = MeasureShake(Moving([](double s) { return 70 * s + 3 * s * s; }), kRate);
+  EXPECT_NEAR(pan.mean, 0, 1e-9) << "a parabola is no shake";
+}
+
+TEST(MeasureShakeTest, FindsTheWorstSecond) {
+  const Shake shake =
+      MeasureShake(Moving([](double s) { return (s > 6 && s < 7 ? 5 : 0.5) * Wave(4, s); }), kRate);
+  EXPECT_NEAR(shake.worst_at, 6.5, 0.1);
+  EXPECT_NEAR(shake.worst, 10 * 2 / std::numbers::pi, 0.6);
+  EXPECT_LT(shake.mean, 2);
+}
+
+// A turn about the middle moves most places, and so does a change of scale.
+TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
+  for (const bool turns : {true, false}) {
+    ShownMotion shown{kWidth, 300, {}, {}};
+    for (int f = 0; f < 300; ++f) {
+      const double step = 0.01 * (f % 2 == 0 ? 1 : -1);
+      shown.motions.push_back(turns ? Similarity{1, step, 0, 0} : Similarity{1 + step, 0, 0, 0});
+    }
+    // Half a step, at the median distance of the 25 places from the middle: 195 pixels.
+    EXPECT_NEAR(MeasureShake(shown, kRate).mean, 0.005 * 195 * 2, 0.15) << turns;
+  }
+}
+
+TEST(MeasureShakeTest, AFewFramesHaveNone) {
+  ShownMotion shown{kWidth, 300, std::vector<Similarity>(4, Similarity{1, 0, 9, 0}), {}};
+  EXPECT_EQ(MeasureShake(shown, kRate).mean, 0);
+  shown.motions.clear();
+  EXPECT_EQ(MeasureShake(shown, kRate).worst, 0);
+}
+
+}  // namespace
+}  // namespace calmframe::host
