@@ -72,8 +72,9 @@ void RenderCommand::Run() {
       output_, PartOf(info, range), info.width, info.height, flags_.encode);
   TellLosses(*writer, progress);
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
-  CheckCrop(*clip, progress);
+  Frame(*clip, flags_.window, progress);
   RenderClip(*clip, range, {.depth = flags_.depth, .threads = run_.threads}, *writer, progress);
+  TellShown(*clip, progress);
   unsaved.Throw();
 }
 

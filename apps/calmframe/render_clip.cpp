@@ -101,7 +101,7 @@ class RenderAhead {
 
   void RenderFrames() {
     try {
-      const std::unique_ptr<host::Renderer> renderer = clip_.effect().MakeRenderer();
+      const std::unique_ptr<host::Renderer> renderer = clip_.drawn().MakeRenderer();
       std::unique_lock lock(mutex_);
       while (true) {
         changed_.wait(lock, [&] { return stopped_ || failure_ || next_ < taken_ + window_; });

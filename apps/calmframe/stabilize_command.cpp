@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdio>
 #include <memory>
 #include <string>
 
@@ -75,6 +76,42 @@ void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
   if (!trouble.line.empty()) progress.Warn(trouble.line);
 }
 
+void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress) {
+  const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };
+  const bool may_follow = value(HX_FRAMING) == kCropAutoScale &&
+                          value(HX_ACTION_SAFE_MARGIN) == 0 && value(HX_ADDITIONAL_SCALE) > 0;
+  // Whoever sets how calm the path is has it so, as far as the effect goes.
+  const bool as_it_comes =
+      value(HX_SMOOTHNESS) == HX_SMOOTHNESS.default_value &&
+      value(HX_CROP_LESS_SMOOTH_MORE) == HX_CROP_LESS_SMOOTH_MORE.default_value &&
+      value(HX_RESULT) == kSmoothMotion;
+  const bool asked = flags.kind == WindowFlags::Kind::follow || flags.most_zoom > 0;
+  if (asked && !may_follow) {
+    throw UsageFailure(
+        "a window that follows the picture needs --framing crop-auto-scale and no margin");
+  }
+  if (flags.kind == WindowFlags::Kind::steady || !may_follow || !(asked || as_it_comes)) {
+    return CheckCrop(clip, progress);
+  }
+  clip.FollowPicture(
+      {.most_zoom = flags.most_zoom > 0 ? flags.most_zoom : value(HX_MAXIMUM_SCALE) / 100});
+}
+
+void TellShown(SteadyClip& clip, ProgressLine& progress) {
+  if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
+  const Shown shown = clip.Measure();
+  char text[200];
+  const double decibels =
+      20 * std::log10(std::max(shown.before.mean, 1e-3) / std::max(shown.after.mean, 1e-3));
+  const int seconds = static_cast<int>(shown.after.worst_at);
+  std::snprintf(text, sizeof text,
+                "%.0f %% of the width kept, zoom %.2f at most; shake %.1f -> %.1f per mille of the "
+                "width (%.1f dB less), at its worst %.1f at %d:%02d",
+                100 * shown.width_kept, shown.most_zoom, shown.before.mean, shown.after.mean,
+                decibels, shown.after.worst, seconds / 60, seconds % 60);
+  progress.Note(text);
+}
+
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
   CLI::Option* const threads = AddNumber<int>(
       command, "--threads", [&flags](int count) { flags.threads = count; }, "N", 1, 1024,
@@ -89,6 +126,21 @@ void AddRunFlags(CLI::App& command, RunFlags& flags) {
 }
 
 void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
+  CLI::Option* const window = AddChoice(
+      command, "--window",
+      [&flags](const std::string& name) {
+        flags.window.kind =
+            name == "follow" ? WindowFlags::Kind::follow : WindowFlags::Kind::steady;
+      },
+      {"follow", "steady"},
+      "What of each frame is shown: a part that follows the picture, which leaves nothing black "
+      "and "
+      "enlarges no further than it may; or the effect's own window. At first the one that follows, "
+      "unless --smoothness, --crop-less-smooth-more, --result or --framing are set");
+  CLI::Option* const zoom = AddNumber<double>(
+      command, "--zoom-at-most", [&flags](double most) { flags.window.most_zoom = most; }, "ZOOM",
+      1, 100, "How far a window that follows may enlarge; at first as far as --maximum-scale, 1.5");
+  PutInGroup("Window", {window, zoom});
   CLI::Option* const crf = AddNumber<int>(
       command, "--crf", [&flags](int value) { flags.encode.crf = value; }, "N", 0, 63,
       "How much the encoder may lose: less looks better and makes larger files");
@@ -125,9 +177,10 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
         media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
     TellLosses(*writer, progress);
     const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
-    CheckCrop(*clip, progress);
+    Frame(*clip, flags.window, progress);
     RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
                progress);
+    TellShown(*clip, progress);
     unsaved.Throw();
   });
 }

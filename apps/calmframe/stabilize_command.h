@@ -25,8 +25,17 @@ struct RunFlags {
 };
 void AddRunFlags(CLI::App& command, RunFlags& flags);
 
-// How the result is written.
+// What of each frame is shown.
+struct WindowFlags {
+  // The effect's own crop window, or one that follows the picture. By the controls: the latter
+  // where all that shape the path and its window are as they come.
+  enum class Kind { by_controls, steady, follow } kind = Kind::by_controls;
+  double most_zoom = 0;  // 0: as the control Maximum Scale has it
+};
+
+// How the result is framed and written.
 struct OutputFlags {
+  WindowFlags window;
   media::EncodeSettings encode;
   int depth = 0;  // see RenderClip
 };
@@ -44,6 +53,13 @@ struct CropTrouble {
   bool nothing_seen = false;
 };
 CropTrouble CropTroubleOf(SteadyClip& clip);
+
+// After the clip's work: chooses what is shown of it, tells what there is to tell of that, and
+// refuses a clip of which nothing would be seen. Throws SolveFailure, UsageFailure, Interrupted.
+void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress);
+
+// One line about what came out of it.
+void TellShown(SteadyClip& clip, ProgressLine& progress);
 
 // Refuses a clip of which nothing would be seen, and tells of one that loses much.
 void CheckCrop(SteadyClip& clip, ProgressLine& progress);

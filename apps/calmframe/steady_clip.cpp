@@ -287,6 +287,73 @@ void SteadyClip::SolveAnew(ProgressLine& progress) {
   CheckResult(progress);
 }
 
+host::SolvedClip SteadyClip::Solved(host::SavedEffect* saved) {
+  const host::CommandResult result = effect_->Save(saved);
+  if (!result.ok()) throw SolveFailure(result.Line(path()));
+  try {
+    return host::ReadSolvedClip(saved->instance);
+  } catch (const host::NoSolvedClip& failure) {
+    throw SolveFailure(path() + ": " + failure.what());
+  }
+}
+
+void SteadyClip::FollowPicture(const host::FollowSettings& settings) {
+  host::SavedEffect saved;
+  const host::SolvedClip solved = Solved(&saved);
+  windows_ = host::FollowWindows(solved, host::FindBackground(solved), settings);
+  // Whoever asks for more than what fills the frame, or for less, has it.
+  const double additional = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
+  const host::Similarity enlarged{1 / additional, 0, (1 - 1 / additional) * (solved.width - 1) / 2,
+                                  (1 - 1 / additional) * (solved.height - 1) / 2};
+  for (host::Similarity& window : windows_) window = host::Compose(window, enlarged);
+  saved.instance = host::WithWindows(saved.instance, windows_);
+  saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
+  const auto state = effect_->shared()->layer()->state();
+  const auto layer = boost::make_shared<host::Layer>(state->source);
+  layer->Change([&](host::LayerState& copy) {
+    copy.name = state->name;
+    copy.file_name = state->file_name;
+    copy.start_frame = state->start_frame;
+    copy.length = state->length;
+    copy.ticks_per_frame = state->ticks_per_frame;
+    copy.field_type = state->field_type;
+  });
+  drawn_ = &session_.Load(layer, saved);
+  session_.TickUntilSettled(std::chrono::hours(24), InterruptAsked);
+  if (InterruptAsked()) throw Interrupted();
+  const int status = host::Session::StatusOf(*drawn_);
+  if (status != kReady) throw SolveFailure(path() + ": " + FailureText(status, {}));
+}
+
+Shown SteadyClip::Measure() {
+  host::SavedEffect saved;
+  const host::SolvedClip solved = Solved(&saved);
+  const double rate = static_cast<double>(info_.frame_rate.num) /
+                      static_cast<double>(info_.frame_rate.den) *
+                      (info_.field_order == media::FieldOrder::progressive ? 1 : 2);
+  const host::Background background = host::FindBackground(solved);
+  const host::ShownMotion motion = host::MotionShown(
+      solved, background, drawn_ ? windows_ : host::OwnWindows(solved, Zoom(solved)));
+  Shown shown;
+  shown.before = host::MeasureShake(host::MotionOfSource(solved, background), rate);
+  shown.after = host::MeasureShake(motion, rate);
+  shown.width_kept = 0;
+  for (const double zoom : motion.zooms) {
+    shown.width_kept += 1 / zoom / static_cast<double>(motion.zooms.size());
+    shown.most_zoom = std::max(shown.most_zoom, zoom);
+  }
+  return shown;
+}
+
+double SteadyClip::Zoom(const host::SolvedClip& solved) const {
+  const double additional = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
+  if (ValueOf(HX_FRAMING.disk_id) != kCropAutoScale || !solved.crop) return additional;
+  const double rest = 1 - ValueOf(HX_ACTION_SAFE_MARGIN.disk_id) / 100;
+  const double fills = std::max((solved.width * rest + 1) / solved.crop->width,
+                                (solved.height * rest + 1) / solved.crop->height);
+  return additional * std::max(1.0, std::min(fills, ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100));
+}
+
 host::Project SteadyClip::Saved() {
   host::Project project;
   const host::CommandResult saved = effect_->Save(&project.effect);

@@ -12,6 +12,7 @@
 #include "host/effects/session.h"
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
+#include "host/stabilize/follow_windows.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
@@ -27,6 +28,13 @@ struct Reuse {
 
   // "reused the analysis and the solve"; empty for nothing.
   std::string Text() const;
+};
+
+// What the output of a clip shows: how calm it is, and what it keeps.
+struct Shown {
+  host::Shake before, after;
+  double width_kept = 1;  // mean over the frames
+  double most_zoom = 1;   // of the frame that shows the least
 };
 
 // How a clip without saved work is opened: all of it decoded to number its frames; or by what its
@@ -49,6 +57,8 @@ class SteadyClip {
   host::Host& host() { return host_; }
   bool has_new_controls() const { return !values_.empty(); }
   host::Effect& effect() { return *effect_; }
+  // What draws the frames: the effect, or where windows follow the picture one that shows these.
+  host::Effect& drawn() { return drawn_ ? *drawn_ : *effect_; }
 
   // Waits until the effect has analysed and solved the clip, as far as that is to do. Throws
   // Interrupted, SolveFailure, media::Failure; the last also where a clip that is gone would have
@@ -59,6 +69,13 @@ class SteadyClip {
   // Solves once more with the controls as they stand, for what only a running solve tells. Throws
   // as Work.
   void SolveAnew(ProgressLine& progress);
+
+  // After Work, with a framing that crops: from now on what is drawn are the calmest windows that
+  // stay in the picture, in place of the effect's own crop window. What is saved stays as it was.
+  // Throws SolveFailure.
+  void FollowPicture(const host::FollowSettings& settings);
+  // After Work, with a framing that crops: what the output shows.
+  Shown Measure();
 
   // Throws SolveFailure where the effect can't be saved.
   host::Project Saved();
@@ -94,6 +111,10 @@ class SteadyClip {
   void TakeAsSaved();
   // Of a parameter, as it was declared. Throws SolveFailure.
   void Set(std::int32_t disk_id, double value);
+  // What the effect would save, and what of it is solved. Throws SolveFailure.
+  host::SolvedClip Solved(host::SavedEffect* saved);
+  // At which the effect shows its crop window.
+  double Zoom(const host::SolvedClip& solved) const;
   // Throws SolveFailure where the effect is not ready.
   void CheckResult(ProgressLine& progress);
   // Address of the first frame's warp, which goes with its solve; null without one.
@@ -104,7 +125,9 @@ class SteadyClip {
   host::Host host_;
   const std::map<std::int32_t, double> values_;
   host::Session session_;
-  host::Effect* effect_ = nullptr;  // the session's
+  host::Effect* effect_ = nullptr;         // the session's
+  host::Effect* drawn_ = nullptr;          // the session's; null: the effect itself
+  std::vector<host::Similarity> windows_;  // of drawn_; see host::WithWindows
 };
 
 }  // namespace calmframe

@@ -1,6 +1,7 @@
 #include <cstdlib>
 #include <map>
 #include <nlohmann/json.hpp>
+#include <random>
 #include <sstream>
 
 #include "tests/apps/calmframe/program_fixture.h"
@@ -129,6 +130,49 @@ TEST_F(ProgramTest, PipesAndPicturesGoInAndPicturesComeOut) {
   EXPECT_NEAR(off / static_cast<double>(a.size()), 0, 2);  // the same range and matrix
   EXPECT_THAT(Files(), ::testing::ElementsAre("f01.jpg", "f02.jpg", "f03.jpg", "f04.jpg", "f05.jpg",
                                               "file.mkv", "in.mp4", "made", "p.calm", "piped.mkv"));
+}
+
+// Two pans that are too fast for one window, by a hand that shakes. No pixel of the wall is black.
+TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
+  std::mt19937 random(4);
+  std::vector<Camera> shake(80);
+  for (Camera& camera : shake) {
+    camera = {(random() % 100) * 0.06, (random() % 100) * 0.06, (random() % 100) * 0.0002};
+  }
+  MakeWall("in.mkv", Made(160, 120, 80, 25), [&](double time) {
+    Camera camera = shake[static_cast<std::size_t>(time)];
+    camera.x += 12 * std::min(std::abs(time - 40), 30.0);
+    return camera;
+  });
+  struct Run {
+    std::string flags, what;
+    double most_zoom;
+  };
+  for (const Run& run : {Run{"", "by itself", 1.5}, Run{"--zoom-at-most 1.15", "limited", 1.15},
+                         Run{"--smoothness 80 --window follow", "asked for", 1.5}}) {
+    const std::string told =
+        RunWell("stabilize in.mkv out.mkv --codec ffv1 --overwrite " + run.flags);
+    const std::size_t at = told.find("zoom ");
+    ASSERT_NE(at, std::string::npos) << told;
+    EXPECT_LE(std::stod(told.substr(at + 5)), run.most_zoom + 0.005) << run.what;
+    const auto out = ClipReader::Open(Path("out.mkv"));
+    for (int frame = 0; frame < 80; ++frame) {
+      int black = 0;
+      for (const auto& pixel : ReadFrame(*out, frame)) {
+        black += pixel.red + pixel.green + pixel.blue < 12;
+      }
+      ASSERT_EQ(black, 0) << run.what << ", frame " << frame;
+    }
+  }
+  // What shapes the path, or shows more or less of it, is the effect's own.
+  const auto content = [&](const std::string& flags) {
+    RunWell("stabilize in.mkv out.y4m --quiet --overwrite " + flags);
+    return Content("out.y4m");
+  };
+  EXPECT_EQ(content("--smoothness 20"), content("--smoothness 20 --window steady"));
+  EXPECT_NE(content(""), content("--window steady"));
+  ExpectLine("stabilize in.mkv x.mkv --quiet --window follow --framing stabilize-only", 2,
+             "needs --framing crop-auto-scale");
 }
 
 TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
