@@ -101,14 +101,16 @@ void TellShown(SteadyClip& clip, ProgressLine& progress) {
   if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
   const Shown shown = clip.Measure();
   char text[200];
+  constexpr double kNone = 0.05;  // what nobody sees, and the tracks' own noise
   const double decibels =
-      20 * std::log10(std::max(shown.before.mean, 1e-3) / std::max(shown.after.mean, 1e-3));
+      20 * std::log10(std::max(shown.before.mean, kNone) / std::max(shown.after.mean, kNone));
   const int seconds = static_cast<int>(shown.after.worst_at);
   std::snprintf(text, sizeof text,
                 "%.0f %% of the width kept, zoom %.2f at most; shake %.1f -> %.1f per mille of the "
-                "width (%.1f dB less), at its worst %.1f at %d:%02d",
+                "width (%.1f dB %s), at its worst %.1f at %d:%02d",
                 100 * shown.width_kept, shown.most_zoom, shown.before.mean, shown.after.mean,
-                decibels, shown.after.worst, seconds / 60, seconds % 60);
+                std::abs(decibels), decibels < 0 ? "more" : "less", shown.after.worst, seconds / 60,
+                seconds % 60);
   progress.Note(text);
 }
 

@@ -43,8 +43,8 @@ class Plane {
     const WarpView warp = Warp(frame);
     const double u = source.x / (clip_.source_width - 1.0) * (clip_.columns - 1);
     const double v = source.y / (clip_.source_height - 1.0) * (clip_.rows - 1);
-    const int c = std::clamp(static_cast<int>(u), 0, clip_.columns - 2);
-    const int r = std::clamp(static_cast<int>(v), 0, clip_.rows - 2);
+    const int c = static_cast<int>(std::clamp(u, 0.0, clip_.columns - 2.0));
+    const int r = static_cast<int>(std::clamp(v, 0.0, clip_.rows - 2.0));
     const double fx = u - c, fy = v - r;
     const auto mix = [&](double Point::*axis) {
       return (warp.at(c, r).*axis * (1 - fx) + warp.at(c + 1, r).*axis * fx) * (1 - fy) +
@@ -78,8 +78,11 @@ class Plane {
     for (std::size_t s = 0; s < slots; ++s) {
       const std::size_t now = frame * slots + s, before = now - slots;
       if (clip_.statuses[now] != 0 || clip_.statuses[before] < 0) continue;
-      from.push_back(At(frame, clip_.tracks[now]));
-      to.push_back(At(frame - 1, clip_.tracks[before]));
+      const Point here = At(frame, clip_.tracks[now]);
+      const Point there = At(frame - 1, clip_.tracks[before]);
+      if (!IsInReach(here) || !IsInReach(there)) continue;
+      from.push_back(here);
+      to.push_back(there);
     }
     return FitMotion(from, to, kTolerance * clip_.width);
   }

@@ -69,11 +69,17 @@ double SquaredMiss(const Similarity& fit, const Point& from, const Point& to) {
 
 }  // namespace
 
+bool IsInReach(const Point& point) {
+  constexpr double kFarthest = 1 << 20;
+  return std::abs(point.x) < kFarthest && std::abs(point.y) < kFarthest;
+}
+
 std::vector<HalfPlane> CoveredRegion(const WarpView& warp, double margin) {
   std::vector<HalfPlane> region;
   Point middle;
   const int count = warp.columns * warp.rows;
   for (int i = 0; i < count; ++i) {
+    if (!IsInReach(warp.vertices[i])) return {};
     middle.x += warp.vertices[i].x / count;
     middle.y += warp.vertices[i].y / count;
   }

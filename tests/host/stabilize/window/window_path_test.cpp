@@ -189,6 +189,10 @@ TEST(CoveredRegionTest, HoldsNothingThatTheWarpDoesNotCover) {
   }
   const std::vector<Point> folded = {{0, 0}, {10, 0}, {10, 10}, {0, 10}};  // bottom turned round
   EXPECT_TRUE(CoveredRegion({folded.data(), 2, 2}, 0).empty());
+  for (const double wrong : {std::nan(""), 1e300}) {
+    const std::vector<Point> none = {{0, 0}, {10, 0}, {0, 10}, {wrong, 10}};
+    EXPECT_TRUE(CoveredRegion({none.data(), 2, 2}, 0).empty());
+  }
 }
 
 }  // namespace
