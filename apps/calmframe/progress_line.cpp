@@ -100,19 +100,23 @@ ProgressLine::~ProgressLine() {
 }
 
 void ProgressLine::Show(const Progress& progress) {
-  if (form_ == Form::none) return;
   const auto now = std::chrono::steady_clock::now();
   const bool begins = stage_ != progress.stage;
   if (begins) {
     stage_ = progress.stage;
     stage_begin_ = now;
   }
+  const double elapsed = std::chrono::duration<double>(now - stage_begin_).count();
+  if (progress.ends) seconds_.emplace_back(progress.stage, elapsed);
+  if (form_ == Form::none || form_ == Form::json_end) {
+    if (progress.ends) stage_.clear();
+    return;
+  }
   constexpr std::chrono::milliseconds kBetween(100);  // faster than that nobody reads
   const bool flows = terminal_ || form_ == Form::json;
   const bool is_due = flows && (progress.lasts || now - last_shown_ >= kBetween);
   if (!begins && !progress.ends && !is_due) return;
   last_shown_ = now;
-  const double elapsed = std::chrono::duration<double>(now - stage_begin_).count();
   if (form_ == Form::json) {
     std::fprintf(stderr, "%s\n", ProgressJson(progress, elapsed).c_str());
   } else {
@@ -126,13 +130,32 @@ void ProgressLine::Warn(const std::string& line) {
 }
 
 void ProgressLine::Note(const std::string& line) {
-  if (form_ != Form::none) Tell("note", line);
+  if (form_ == Form::line || form_ == Form::json) Tell("note", line);
+}
+
+void ProgressLine::End(const std::string& line, nlohmann::ordered_json object) {
+  nlohmann::ordered_json sums = nlohmann::ordered_json::object();
+  for (const auto& [stage, seconds] : seconds_) sums[stage] = sums.value(stage, 0.0) + seconds;
+  std::string stages;
+  for (auto& [stage, sum] : sums.items()) {
+    const double seconds = std::round(sum.get<double>() * 1000) / 1000;
+    sum = seconds;
+    char text[32];
+    std::snprintf(text, sizeof text, " %.1f s", seconds);
+    stages += (stages.empty() ? "" : ", ") + stage + text;
+  }
+  object["seconds"] = sums;
+  if (form_ == Form::line) {
+    Note(line + (stages.empty() ? "" : " (" + stages + ")"));
+  } else if (form_ != Form::none) {
+    std::fprintf(stderr, "%s\n", JsonLine(object).c_str());
+  }
 }
 
 void ProgressLine::Tell(const char* key, const std::string& line) {
   if (line_open_) std::fputc('\n', stderr);
   line_open_ = false;
-  if (form_ == Form::json) {
+  if (form_ == Form::json || form_ == Form::json_end) {
     std::fprintf(stderr, "%s\n", JsonLine({{key, line}}).c_str());
   } else {
     std::fprintf(stderr, "calmframe: %s\n", line.c_str());

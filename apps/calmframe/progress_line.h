@@ -4,6 +4,8 @@
 #include <nlohmann/json_fwd.hpp>
 #include <set>
 #include <string>
+#include <utility>
+#include <vector>
 
 namespace calmframe {
 
@@ -21,7 +23,8 @@ struct Progress {
 // line at the start and the end of each stage; or, for programs, one JSON object a line.
 class ProgressLine {
  public:
-  enum class Form { none, line, json };
+  // json_end: as JSON, but no progress and no notes.
+  enum class Form { none, line, json, json_end };
   explicit ProgressLine(Form form);
   ~ProgressLine();
   ProgressLine(const ProgressLine&) = delete;
@@ -32,6 +35,9 @@ class ProgressLine {
   void Warn(const std::string& line);
   // One line about how things went.
   void Note(const std::string& line);
+  // What came out of it all: the line, or for programs the object, both with the seconds that each
+  // stage took.
+  void End(const std::string& line, nlohmann::ordered_json object);
 
  private:
   void Write(const std::string& text, bool last);
@@ -44,6 +50,7 @@ class ProgressLine {
   std::chrono::steady_clock::time_point last_shown_;
   bool line_open_ = false;
   std::set<std::string> warned_;
+  std::vector<std::pair<std::string, double>> seconds_;  // of the stages that ended, in their order
 };
 
 // An object as a line for programs. A file's name may be no UTF-8; then what isn't is replaced.

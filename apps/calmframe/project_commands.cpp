@@ -74,7 +74,7 @@ void RenderCommand::Run() {
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   Frame(*clip, flags_.window, progress);
   RenderClip(*clip, range, {.depth = flags_.depth, .threads = run_.threads}, *writer, progress);
-  TellShown(*clip, progress);
+  TellOutcome(*clip, progress);
   unsaved.Throw();
 }
 

@@ -2,8 +2,8 @@
 
 #include <algorithm>
 #include <cmath>
-#include <cstdio>
 #include <memory>
+#include <nlohmann/json.hpp>
 #include <string>
 
 #include "apps/calmframe/failures.h"
@@ -97,21 +97,21 @@ void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress) {
       {.most_zoom = flags.most_zoom > 0 ? flags.most_zoom : value(HX_MAXIMUM_SCALE) / 100});
 }
 
-void TellShown(SteadyClip& clip, ProgressLine& progress) {
+void TellOutcome(SteadyClip& clip, ProgressLine& progress) {
   if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
-  const Shown shown = clip.Measure();
-  char text[200];
-  constexpr double kNone = 0.05;  // what nobody sees, and the tracks' own noise
-  const double decibels =
-      20 * std::log10(std::max(shown.before.mean, kNone) / std::max(shown.after.mean, kNone));
-  const int seconds = static_cast<int>(shown.after.worst_at);
-  std::snprintf(text, sizeof text,
-                "%.0f %% of the width kept, zoom %.2f at most; shake %.1f -> %.1f per mille of the "
-                "width (%.1f dB %s), at its worst %.1f at %d:%02d",
-                100 * shown.width_kept, shown.most_zoom, shown.before.mean, shown.after.mean,
-                std::abs(decibels), decibels < 0 ? "more" : "less", shown.after.worst, seconds / 60,
-                seconds % 60);
-  progress.Note(text);
+  const host::Outcome outcome = clip.Measure();
+  const auto rounded = [](double value) { return std::round(value * 10000) / 10000; };
+  nlohmann::ordered_json object;
+  object["window"] = outcome.follows ? "follow" : "steady";
+  object["width_kept"] = rounded(outcome.width_kept);
+  object["most_zoom"] = rounded(outcome.most_zoom);
+  object["most_black"] = rounded(outcome.most_black);
+  object["shake_before"] = rounded(outcome.before.mean);
+  object["shake_after"] = rounded(outcome.after.mean);
+  object["decibels"] = rounded(outcome.decibels());
+  object["worst_shake"] = rounded(outcome.after.worst);
+  object["worst_at"] = rounded(outcome.after.worst_at);
+  progress.End(outcome.Text(), object);
 }
 
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
@@ -119,11 +119,11 @@ void AddRunFlags(CLI::App& command, RunFlags& flags) {
       command, "--threads", [&flags](int count) { flags.threads = count; }, "N", 1, 1024,
       "Processors to use; all at first");
   CLI::Option* const quiet =
-      AddSwitch(command, "--quiet", flags.quiet, "Show no progress; warnings and errors still");
-  CLI::Option* const json =
-      AddSwitch(command, "--json", flags.json,
-                "Show progress, warnings and errors as JSON objects, one a line, for programs");
-  Exclude(*json, *quiet);
+      AddSwitch(command, "--quiet", flags.quiet,
+                "Show no progress; warnings and errors still, and with --json what came out");
+  CLI::Option* const json = AddSwitch(command, "--json", flags.json,
+                                      "Show progress, warnings, errors and what came out as JSON "
+                                      "objects, one a line, for programs");
   PutInGroup("Running", {threads, quiet, json});
 }
 
@@ -182,7 +182,7 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
     Frame(*clip, flags.window, progress);
     RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
                progress);
-    TellShown(*clip, progress);
+    TellOutcome(*clip, progress);
     unsaved.Throw();
   });
 }

@@ -18,9 +18,8 @@ struct RunFlags {
   bool json = false;
 
   ProgressLine::Form progress_form() const {
-    return json    ? ProgressLine::Form::json
-           : quiet ? ProgressLine::Form::none
-                   : ProgressLine::Form::line;
+    if (json) return quiet ? ProgressLine::Form::json_end : ProgressLine::Form::json;
+    return quiet ? ProgressLine::Form::none : ProgressLine::Form::line;
   }
 };
 void AddRunFlags(CLI::App& command, RunFlags& flags);
@@ -58,8 +57,8 @@ CropTrouble CropTroubleOf(SteadyClip& clip);
 // refuses a clip of which nothing would be seen. Throws SolveFailure, UsageFailure, Interrupted.
 void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress);
 
-// One line about what came out of it.
-void TellShown(SteadyClip& clip, ProgressLine& progress);
+// What came out of it, behind all else that a run says.
+void TellOutcome(SteadyClip& clip, ProgressLine& progress);
 
 // Refuses a clip of which nothing would be seen, and tells of one that loses much.
 void CheckCrop(SteadyClip& clip, ProgressLine& progress);

@@ -325,24 +325,17 @@ void SteadyClip::FollowPicture(const host::FollowSettings& settings) {
   if (status != kReady) throw SolveFailure(path() + ": " + FailureText(status, {}));
 }
 
-Shown SteadyClip::Measure() {
+host::Outcome SteadyClip::Measure() {
   host::SavedEffect saved;
   const host::SolvedClip solved = Solved(&saved);
   const double rate = static_cast<double>(info_.frame_rate.num) /
                       static_cast<double>(info_.frame_rate.den) *
                       (info_.field_order == media::FieldOrder::progressive ? 1 : 2);
-  const host::Background background = host::FindBackground(solved);
-  const host::ShownMotion motion = host::MotionShown(
-      solved, background, drawn_ ? windows_ : host::OwnWindows(solved, Zoom(solved)));
-  Shown shown;
-  shown.before = host::MeasureShake(host::MotionOfSource(solved, background), rate);
-  shown.after = host::MeasureShake(motion, rate);
-  shown.width_kept = 0;
-  for (const double zoom : motion.zooms) {
-    shown.width_kept += 1 / zoom / static_cast<double>(motion.zooms.size());
-    shown.most_zoom = std::max(shown.most_zoom, zoom);
-  }
-  return shown;
+  host::Outcome outcome =
+      host::MeasureOutcome(solved, host::FindBackground(solved),
+                           drawn_ ? windows_ : host::OwnWindows(solved, Zoom(solved)), rate);
+  outcome.follows = drawn_ != nullptr;
+  return outcome;
 }
 
 double SteadyClip::Zoom(const host::SolvedClip& solved) const {

@@ -12,7 +12,7 @@
 #include "host/effects/session.h"
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
-#include "host/stabilize/follow_windows.h"
+#include "host/stabilize/outcome.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
@@ -28,13 +28,6 @@ struct Reuse {
 
   // "reused the analysis and the solve"; empty for nothing.
   std::string Text() const;
-};
-
-// What the output of a clip shows: how calm it is, and what it keeps.
-struct Shown {
-  host::Shake before, after;
-  double width_kept = 1;  // mean over the frames
-  double most_zoom = 1;   // of the frame that shows the least
 };
 
 // How a clip without saved work is opened: all of it decoded to number its frames; or by what its
@@ -74,8 +67,9 @@ class SteadyClip {
   // stay in the picture, in place of the effect's own crop window. What is saved stays as it was.
   // Throws SolveFailure.
   void FollowPicture(const host::FollowSettings& settings);
-  // After Work, with a framing that crops: what the output shows.
-  Shown Measure();
+  // After Work, with a framing that crops: what the output shows. What a maximum scale leaves empty
+  // beside the effect's own window is not seen here.
+  host::Outcome Measure();
 
   // Throws SolveFailure where the effect can't be saved.
   host::Project Saved();

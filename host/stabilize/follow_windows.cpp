@@ -159,21 +159,31 @@ ShownMotion MotionShown(const SolvedClip& clip, const Background& background,
                         const std::vector<Similarity>& windows) {
   const Plane plane(clip, true);
   const Point middle = Middle(clip);
-  ShownMotion shown{double(clip.width), double(clip.height), {}, {}};
+  ShownMotion shown;
+  shown.width = clip.width;
+  shown.height = clip.height;
   Similarity before;
+  std::vector<Point> in_output;
   for (std::size_t f = 0; f < windows.size(); ++f) {
     const Similarity window = Moved(windows[f], {-middle.x, -middle.y});
+    const Similarity to_output = Inverse(window);
     shown.zooms.push_back(plane.Scale(f) / std::hypot(window.a, window.b));
     shown.motions.push_back(
         f == 0 ? Similarity{} : Compose(Inverse(before), Compose(background.in_plane[f], window)));
+    const WarpView warp = plane.Warp(f);
+    in_output.assign(warp.vertices, warp.vertices + warp.columns * warp.rows);
+    for (Point& vertex : in_output) vertex = to_output(vertex);
+    shown.uncovered.push_back(UncoveredShare({in_output.data(), warp.columns, warp.rows},
+                                             clip.width - 1.0, clip.height - 1.0));
     before = window;
   }
   return shown;
 }
 
 ShownMotion MotionOfSource(const SolvedClip& clip, const Background& background) {
+  const std::size_t frames = background.in_source.size();
   return {double(clip.width), double(clip.height), background.in_source,
-          std::vector<double>(background.in_source.size(), 1.0)};
+          std::vector<double>(frames, 1.0), std::vector<double>(frames, 0.0)};
 }
 
 }  // namespace calmframe::host

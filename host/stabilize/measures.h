@@ -12,7 +12,8 @@ struct ShownMotion {
   // Takes a background point of a frame to its place in the frame before, pixels about the output's
   // middle; of the first frame without meaning.
   std::vector<Similarity> motions;
-  std::vector<double> zooms;  // how many times enlarged each frame shows the source
+  std::vector<double> zooms;      // how many times enlarged each frame shows the source
+  std::vector<double> uncovered;  // share of each frame where the source shows nothing, 0 to 1
 };
 
 // Motion that is faster than about 0.9 Hz, in pixels of a picture 1000 wide: how far the path of

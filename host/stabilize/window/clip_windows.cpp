@@ -2,7 +2,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstddef>
 #include <cstdint>
+#include <utility>
 
 namespace calmframe::host {
 namespace {
@@ -99,6 +101,41 @@ std::vector<HalfPlane> CoveredRegion(const WarpView& warp, double margin) {
     region.push_back(half);
   }
   return region;
+}
+
+double UncoveredShare(const WarpView& warp, double width, double height) {
+  std::vector<Point> outline;
+  for (int side = 0; side < 4; ++side) {
+    const std::vector<Point> points = Side(warp, side);
+    outline.insert(outline.end(), points.begin(), points.end() - 1);
+  }
+  if (!std::all_of(outline.begin(), outline.end(), IsInReach)) return 1;
+  const HalfPlane sides[] = {
+      {1, 0, width / 2}, {-1, 0, width / 2}, {0, 1, height / 2}, {0, -1, height / 2}};
+  for (const HalfPlane& side : sides) {
+    const auto beyond = [&side](const Point& p) {
+      return side.nx * p.x + side.ny * p.y - side.limit;
+    };
+    std::vector<Point> kept;
+    for (std::size_t i = 0; i < outline.size(); ++i) {
+      const Point& from = outline[i];
+      const Point& to = outline[(i + 1) % outline.size()];
+      const double a = beyond(from), b = beyond(to);
+      if (a <= 0) kept.push_back(from);
+      if ((a <= 0) != (b <= 0)) {
+        kept.push_back(
+            {from.x + (to.x - from.x) * a / (a - b), from.y + (to.y - from.y) * a / (a - b)});
+      }
+    }
+    outline = std::move(kept);
+  }
+  double twice = 0;
+  for (std::size_t i = 0; i < outline.size(); ++i) {
+    const Point& p = outline[i];
+    const Point& q = outline[(i + 1) % outline.size()];
+    twice += p.x * q.y - q.x * p.y;
+  }
+  return std::clamp(1 - twice / 2 / (width * height), 0.0, 1.0);
 }
 
 Similarity FitMotion(const std::vector<Point>& from, const std::vector<Point>& to,

@@ -24,6 +24,11 @@ bool IsInReach(const Point& point);
 // where it lies beyond all frames' sizes or is no number.
 std::vector<HalfPlane> CoveredRegion(const WarpView& warp, double margin);
 
+// Share of a rectangle of width x height about the middle that lies outside of the frame's outline,
+// 0 to 1: what shows nothing where the warp leads into the output (Sutherland and Hodgman,
+// Communications of the ACM 17, 1974). 1 of one out of reach.
+double UncoveredShare(const WarpView& warp, double width, double height);
+
 // The similarity that takes most points of `from` to those of `to` (equally many), which is that of
 // the background where it holds the most of them: the best of a fixed series of pairs, refined by
 // Tukey's bisquare (Hampel et al., Robust Statistics, 1986, ch. 2.6). `tolerance`: pixels. The

@@ -241,7 +241,6 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
                {"stabilize a b --crf", "--crf takes a value"},
                {"stabilize a b --depth 12", "none of 8, 16, 32"},
                {"render --project a b --from -3", "0 or more"},
-               {"stabilize a b --json --quiet", "--quiet"},
                {"params --param Smothness=3", "did you mean 'Smoothness'?"},
                {"params --param \"Maximum Scale=99\"", "100 to 10000"},
                {"params --param \"Method=Perspectiv\"", "did you mean Perspective?"},
@@ -353,6 +352,16 @@ TEST_F(ProgramTest, JsonTellsHowFarEachStageIsAndHowItEnded) {
   // What the encoder still holds is written before all is said to be done.
   const std::vector<nlohmann::json>& rendering = shown["rendering"];
   EXPECT_EQ(rendering.at(rendering.size() - 2).value("says", ""), "encoding the last frames");
+  // Of a quiet run nothing but what came out.
+  const auto end = nlohmann::json::parse(
+      RunWell("stabilize in.mp4 out.mp4 --overwrite --json --quiet --detailed-analysis"));
+  EXPECT_EQ(end["window"], "follow");
+  EXPECT_LT(end["shake_after"], end["shake_before"]);
+  EXPECT_GT(end["width_kept"], 1 / 1.5);
+  EXPECT_LE(end["most_black"], 0.001);
+  for (const char* stage : {"analyzing", "solving", "rendering"}) {
+    EXPECT_GT(end["seconds"][stage], 0) << stage;
+  }
   const Outcome failed = Run("stabilize missing.mp4 out2.mp4 --json");
   EXPECT_EQ(failed.code, 3);
   EXPECT_EQ(nlohmann::json::parse(failed.text)["exit_code"], 3);

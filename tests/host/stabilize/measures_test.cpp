@@ -13,7 +13,7 @@ constexpr double kRate = 30, kWidth = 500;
 
 // Ten seconds in which the background's place is at(seconds), in pixels.
 ShownMotion Moving(const std::function<double(double)>& at) {
-  ShownMotion shown{kWidth, 300, {}, {}};
+  ShownMotion shown{kWidth, 300, {}, {}, {}};
   for (int f = 0; f < 300; ++f) {
     shown.motions.push_back({1, 0, at((f - 1) / kRate) - at(f / kRate), 0});
   }
@@ -47,7 +47,7 @@ TEST(MeasureShakeTest, FindsTheWorstSecond) {
 // A turn about the middle moves most places, and so does a change of scale.
 TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
   for (const bool turns : {true, false}) {
-    ShownMotion shown{kWidth, 300, {}, {}};
+    ShownMotion shown{kWidth, 300, {}, {}, {}};
     for (int f = 0; f < 300; ++f) {
       const double step = 0.01 * (f % 2 == 0 ? 1 : -1);
       shown.motions.push_back(turns ? Similarity{1, step, 0, 0} : Similarity{1 + step, 0, 0, 0});
@@ -58,7 +58,7 @@ TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
 }
 
 TEST(MeasureShakeTest, AFewFramesHaveNone) {
-  ShownMotion shown{kWidth, 300, std::vector<Similarity>(4, Similarity{1, 0, 9, 0}), {}};
+  ShownMotion shown{kWidth, 300, std::vector<Similarity>(4, Similarity{1, 0, 9, 0}), {}, {}};
   EXPECT_EQ(MeasureShake(shown, kRate).mean, 0);
   shown.motions.clear();
   EXPECT_EQ(MeasureShake(shown, kRate).worst, 0);

@@ -195,5 +195,22 @@ TEST(CoveredRegionTest, HoldsNothingThatTheWarpDoesNotCover) {
   }
 }
 
+TEST(UncoveredShareTest, IsWhatTheOutlineLeavesOut) {
+  struct Quad {
+    std::vector<Point> corners;  // of one cell, row by row
+    double uncovered;
+  };
+  // A square of side 2 under a frame of its size, a tenth aside; one turned by 45 degrees, whose
+  // sides cut off four triangles of half a unit; around all; beside all.
+  for (const Quad& c :
+       {Quad{{{-1, -1}, {1, -1}, {-1, 1}, {1, 1}}, 0},
+        Quad{{{-0.8, -1}, {1.2, -1}, {-0.8, 1}, {1.2, 1}}, 0.1},
+        Quad{{{0, -1.5}, {1.5, 0}, {-1.5, 0}, {0, 1.5}}, 0.125},
+        Quad{{{-9, -9}, {9, -9}, {-9, 9}, {9, 9}}, 0}, Quad{{{4, -1}, {6, -1}, {4, 1}, {6, 1}}, 1},
+        Quad{{{-1, -1}, {std::nan(""), -1}, {-1, 1}, {1, 1}}, 1}}) {
+    EXPECT_NEAR(UncoveredShare({c.corners.data(), 2, 2}, 2, 2), c.uncovered, 1e-9);
+  }
+}
+
 }  // namespace
 }  // namespace calmframe::host
