@@ -92,7 +92,18 @@ class LiveThreads {
       std::lock_guard<std::mutex> lock(mutex_);
       ended.swap(ended_);
     }
-    for (std::thread& thread : ended) thread.join();
+    for (std::thread& thread : ended) {
+      if (thread.joinable()) thread.join();
+    }
+  }
+
+  // The process ends, and waits for none that is at work.
+  void LetGo() {
+    {
+      std::lock_guard<std::mutex> lock(mutex_);
+      for (std::thread& thread : live_) thread.detach();
+    }
+    JoinEnded();
   }
 
  private:
@@ -126,7 +137,7 @@ void EndLoopThreads() {
 // What has ended is joined at the process's end, too, where nobody shut down.
 struct JoinAtExit {
   ~JoinAtExit() {
-    live_threads().JoinEnded();
+    live_threads().LetGo();
     EndLoopThreads();
   }
 };
