@@ -93,8 +93,7 @@ void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress) {
   if (flags.kind == WindowFlags::Kind::steady || !may_follow || !(asked || as_it_comes)) {
     return CheckCrop(clip, progress);
   }
-  clip.FollowPicture(
-      {.most_zoom = flags.most_zoom > 0 ? flags.most_zoom : value(HX_MAXIMUM_SCALE) / 100});
+  clip.FollowPicture(flags.most_zoom > 0 ? flags.most_zoom : value(HX_MAXIMUM_SCALE) / 100);
 }
 
 void TellOutcome(SteadyClip& clip, ProgressLine& progress) {
@@ -103,6 +102,7 @@ void TellOutcome(SteadyClip& clip, ProgressLine& progress) {
   const auto rounded = [](double value) { return std::round(value * 10000) / 10000; };
   nlohmann::ordered_json object;
   object["window"] = outcome.follows ? "follow" : "steady";
+  object["bends"] = outcome.bends;
   object["width_kept"] = rounded(outcome.width_kept);
   object["most_zoom"] = rounded(outcome.most_zoom);
   object["most_black"] = rounded(outcome.most_black);

@@ -24,6 +24,7 @@ constexpr std::int32_t kCancelButton = 11;
 constexpr std::int32_t kStabilizationGroup = 12;
 constexpr std::int32_t kAutoScaleGroup = 17;  // its name tells the scale
 constexpr std::int32_t kMethod = HX_METHOD.disk_id;
+constexpr std::int32_t kDeblur = 15;  // an experts' group, with a checkbox
 
 // Where few tracks are, those that leave the others by more than so many pixels of a picture 1000
 // wide count less. Of eight filmed clips' first 6 to 14 frames 2 to 3 kept the most of the width.
@@ -297,16 +298,17 @@ host::SolvedClip SteadyClip::Solved(host::SavedEffect* saved) {
   }
 }
 
-void SteadyClip::FollowPicture(const host::FollowSettings& settings) {
+void SteadyClip::FollowPicture(double most_zoom) {
   host::SavedEffect saved;
   const host::SolvedClip solved = Solved(&saved);
-  windows_ = host::FollowWindows(solved, host::FindBackground(solved), settings);
-  // Whoever asks for more than what fills the frame, or for less, has it.
-  const double additional = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
-  const host::Similarity enlarged{1 / additional, 0, (1 - 1 / additional) * (solved.width - 1) / 2,
-                                  (1 - 1 / additional) * (solved.height - 1) / 2};
-  for (host::Similarity& window : windows_) window = host::Compose(window, enlarged);
-  saved.instance = host::WithWindows(saved.instance, windows_);
+  host::FollowSettings settings;
+  settings.most_zoom = most_zoom;
+  settings.enlarged = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
+  // Whoever asks for a method has its warps; deblurring goes by theirs, too.
+  const bool may_leave_warps = ValueOf(kMethod) == HX_METHOD.default_item && ValueOf(kDeblur) == 0;
+  const host::Choice choice = host::Choose(solved, settings, FramesPerSecond(), may_leave_warps);
+  outcome_ = choice.outcome;
+  saved.instance = host::WithWindows(saved.instance, choice.windows, choice.warps);
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
   const auto state = effect_->shared()->layer()->state();
   const auto layer = boost::make_shared<host::Layer>(state->source);
@@ -326,16 +328,16 @@ void SteadyClip::FollowPicture(const host::FollowSettings& settings) {
 }
 
 host::Outcome SteadyClip::Measure() {
+  if (drawn_) return outcome_;
   host::SavedEffect saved;
   const host::SolvedClip solved = Solved(&saved);
-  const double rate = static_cast<double>(info_.frame_rate.num) /
-                      static_cast<double>(info_.frame_rate.den) *
-                      (info_.field_order == media::FieldOrder::progressive ? 1 : 2);
-  host::Outcome outcome =
-      host::MeasureOutcome(solved, host::FindBackground(solved),
-                           drawn_ ? windows_ : host::OwnWindows(solved, Zoom(solved)), rate);
-  outcome.follows = drawn_ != nullptr;
-  return outcome;
+  return host::MeasureOutcome(solved, host::FindBackground(solved),
+                              host::OwnWindows(solved, Zoom(solved)), FramesPerSecond());
+}
+
+double SteadyClip::FramesPerSecond() const {
+  return static_cast<double>(info_.frame_rate.num) / static_cast<double>(info_.frame_rate.den) *
+         (info_.field_order == media::FieldOrder::progressive ? 1 : 2);
 }
 
 double SteadyClip::Zoom(const host::SolvedClip& solved) const {

@@ -12,7 +12,7 @@
 #include "host/effects/session.h"
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
-#include "host/stabilize/outcome.h"
+#include "host/stabilize/choice.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
@@ -64,9 +64,10 @@ class SteadyClip {
   void SolveAnew(ProgressLine& progress);
 
   // After Work, with a framing that crops: from now on what is drawn are the calmest windows that
-  // stay in the picture, in place of the effect's own crop window. What is saved stays as it was.
-  // Throws SolveFailure.
-  void FollowPicture(const host::FollowSettings& settings);
+  // stay in the picture, enlarged at most so far, in place of the effect's own crop window; and
+  // where that is calmer, the frames as they were shot. What is saved stays as it was. Throws
+  // SolveFailure.
+  void FollowPicture(double most_zoom);
   // After Work, with a framing that crops: what the output shows. What a maximum scale leaves empty
   // beside the effect's own window is not seen here.
   host::Outcome Measure();
@@ -107,6 +108,7 @@ class SteadyClip {
   void Set(std::int32_t disk_id, double value);
   // What the effect would save, and what of it is solved. Throws SolveFailure.
   host::SolvedClip Solved(host::SavedEffect* saved);
+  double FramesPerSecond() const;  // fields, of an interlaced clip
   // At which the effect shows its crop window.
   double Zoom(const host::SolvedClip& solved) const;
   // Throws SolveFailure where the effect is not ready.
@@ -119,9 +121,9 @@ class SteadyClip {
   host::Host host_;
   const std::map<std::int32_t, double> values_;
   host::Session session_;
-  host::Effect* effect_ = nullptr;         // the session's
-  host::Effect* drawn_ = nullptr;          // the session's; null: the effect itself
-  std::vector<host::Similarity> windows_;  // of drawn_; see host::WithWindows
+  host::Effect* effect_ = nullptr;  // the session's
+  host::Effect* drawn_ = nullptr;   // the session's; null: the effect itself
+  host::Outcome outcome_;           // of drawn_
 };
 
 }  // namespace calmframe

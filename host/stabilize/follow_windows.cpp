@@ -136,7 +136,8 @@ std::vector<Similarity> FollowWindows(const SolvedClip& clip, const Background& 
   std::vector<Similarity> windows =
       FindWindowPath(clip.width, clip.height, frames, settings.weights);
   const Point middle = Middle(clip);
-  for (Similarity& window : windows) window = Moved(window, middle);
+  const Similarity enlarged{1 / settings.enlarged, 0, 0, 0};
+  for (Similarity& window : windows) window = Moved(Compose(window, enlarged), middle);
   return windows;
 }
 

@@ -18,6 +18,7 @@ Background FindBackground(const SolvedClip& clip);
 
 struct FollowSettings {
   double most_zoom = 1.5;  // of the source, by the window and the warp together; at least 1
+  double enlarged = 1;     // on top of that; below 1 the picture gets a rim
   WindowWeights weights = {};
 };
 

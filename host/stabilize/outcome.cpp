@@ -21,9 +21,10 @@ std::string Outcome::Text() const {
   char text[256];
   std::snprintf(text, sizeof text,
                 "%.0f %% of the width kept, zoom %.2f at most, %s; shake %.1f -> %.1f per mille of "
-                "the width (%.1f dB %s), at its worst %.1f at %d:%02d",
+                "the width (%.1f dB %s), at its worst %.1f at %d:%02d%s",
                 100 * width_kept, most_zoom, black, before.mean, after.mean, std::abs(decibels()),
-                decibels() < 0 ? "more" : "less", after.worst, seconds / 60, seconds % 60);
+                decibels() < 0 ? "more" : "less", after.worst, seconds / 60, seconds % 60,
+                bends ? "" : "; no frame is bent");
   return text;
 }
 

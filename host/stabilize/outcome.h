@@ -8,7 +8,8 @@ namespace calmframe::host {
 
 // What a steadied clip shows, as every front end tells it.
 struct Outcome {
-  bool follows = false;   // windows that follow the picture; else the effect's own
+  bool follows = false;  // windows that follow the picture; else the effect's own
+  bool bends = true;  // frames are warped as the effect solved it; else they are as they were shot
   double width_kept = 1;  // of the source: mean of what the frames show
   double most_zoom = 1;   // of the frame that is enlarged most
   double most_black = 0;  // share of the frame that shows the least, 0 to 1

@@ -81,6 +81,13 @@ class Grid {
     for (std::size_t i = 0; i < corners.size(); ++i) vertices_[corners_[i]] = corners[i];
   }
 
+  // Every vertex where it stands in a frame of that size.
+  void Rest(double width, double height) {
+    const Point far = {width - 1, height - 1};
+    ForEach({Point{}, {far.x, 0}, {0, far.y}, far},
+            [](Point& vertex, const Point& flat) { vertex = flat; });
+  }
+
   // In as many bytes as it was read from.
   void Write(SolvedPayload& payload, std::size_t place) {
     std::array<Point, 4> corners;
@@ -270,7 +277,7 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
 }
 
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
-                                      const std::vector<Similarity>& windows) {
+                                      const std::vector<Similarity>& windows, Warps warps) {
   SolvedPayload payload = ReadPayload(instance);
   const SolvedLayout& layout = payload.layout;
   if (windows.size() != static_cast<std::size_t>(layout.frames)) {
@@ -282,10 +289,17 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
   const auto columns = static_cast<std::size_t>(layout.columns);
   const auto rows = static_cast<std::size_t>(layout.rows);
   const auto place = [&](std::size_t f) { return layout.warps + f * Grid::StoredBytes(layout); };
+  const auto take = [&](std::size_t f) {
+    if (warps == Warps::solved) {
+      grid.Read(payload, place(f));
+    } else {
+      grid.Rest(layout.square_width(), layout.source_height);
+    }
+    grid.Move(output_from_plane[f]);
+  };
   Bounds bounds;
   for (std::size_t f = 0; f < windows.size(); ++f) {
-    grid.Read(payload, place(f));
-    grid.Move(output_from_plane[f]);
+    take(f);
     bounds.Add(grid.vertices().data(), columns, rows);
   }
   // The effect draws nothing past the bounds' size, counted from 0 and not from their least: where
@@ -298,8 +312,7 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
   }
   bounds = {};
   for (std::size_t f = 0; f < windows.size(); ++f) {
-    grid.Read(payload, place(f));
-    grid.Move(output_from_plane[f]);
+    take(f);
     grid.Write(payload, place(f));
     grid.Read(payload, place(f));
     bounds.Add(grid.vertices().data(), columns, rows);
@@ -310,6 +323,16 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
   payload.bytes.replace(layout.crop, StoredCropBytes(payload), CropOfWholeFrame(layout, in_output));
 
   return InstanceOf(payload.bytes);
+}
+
+SolvedClip WithoutWarps(SolvedClip clip) {
+  Grid grid(static_cast<std::size_t>(clip.columns), static_cast<std::size_t>(clip.rows));
+  grid.Rest(clip.width, clip.height);
+  for (std::size_t at = 0; at < clip.vertices.size(); at += grid.vertices().size()) {
+    std::copy(grid.vertices().begin(), grid.vertices().end(),
+              clip.vertices.begin() + static_cast<std::ptrdiff_t>(at));
+  }
+  return clip;
 }
 
 Point ShiftWithoutCrop(const SolvedClip& clip) {

@@ -59,6 +59,12 @@ class NoSolvedClip : public std::runtime_error {
 // before the bytes are there.
 SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance);
 
+// A frame's warp as it was solved, or none: then the stabilized plane is the source itself.
+enum class Warps { solved, none };
+
+// The clip with all vertices at rest.
+SolvedClip WithoutWarps(SolvedClip clip);
+
 // The instance of an effect that shows, of each frame, what windows[frame] tells: it takes points
 // of the output frame to the stabilized plane. What the instance holds besides stays, byte by byte,
 // so that nothing is analysed, solved or framed anew where it is loaded, on a layer of the same
@@ -73,10 +79,12 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance);
 //
 // Vertices are rounded to 1/256 pixel of the output frame. For the effect's sake the plane of the
 // new instance may lie some whole pixels to the left of the output frame, and above; its crop's
-// windows are the output frame. Throws NoSolvedClip as above, and std::invalid_argument where the
-// windows are not one a frame, or one has no inverse.
+// windows are the output frame. Without warps the frame map stays that of those that were solved:
+// not for framing 4, nor for deblurring. Throws NoSolvedClip as above, and std::invalid_argument
+// where the windows are not one a frame, or one has no inverse.
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
-                                      const std::vector<Similarity>& windows);
+                                      const std::vector<Similarity>& windows,
+                                      Warps warps = Warps::solved);
 
 // How far from its place in the output frame a framing that does not crop shows every picture, to
 // the right and downwards, in the source's own pixels, at full render scale and 100 %; of a clip
