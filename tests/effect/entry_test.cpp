@@ -185,7 +185,7 @@ TEST_F(EntryTest, OperationsStandInTheOrderThatOtherCallersKnow) {
   const Operation* table = nullptr;
   ProbeEffect effect({15, &in_, &out_, params_, &output_, &event_});
   event_.event_type = 9;
-  std::memcpy(&table, &effect, sizeof table);
+  std::memcpy(&table, static_cast<const void*>(&effect), sizeof table);
   for (int place = 0; place < 32; ++place) table[place](&effect, 1000);
   std::string order;
   for (const std::string& call : script.calls) order += call + " ";

@@ -49,10 +49,10 @@ TEST_F(HostAccessTest, EverySuiteIsThereAndMayBeRefused) {
   const HX_BasicSuite refusing = {Refuse, host->release};
   for (const auto& [acquire, name] : suites) {
     in_.basic = host;
-    EXPECT_EQ(Thrown([&] { acquire(context_); }), 0) << name;
+    EXPECT_EQ(Thrown([&, acquire = acquire] { acquire(context_); }), 0) << name;
     EXPECT_EQ(TakeMessage(), "");
     in_.basic = &refusing;
-    EXPECT_EQ(Thrown([&] { acquire(context_); }), 13) << name;
+    EXPECT_EQ(Thrown([&, acquire = acquire] { acquire(context_); }), 13) << name;
     EXPECT_EQ(asked, name);
     EXPECT_EQ(TakeMessage(), kNoSuite);
   }

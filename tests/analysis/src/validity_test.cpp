@@ -113,7 +113,7 @@ TEST_F(ValidityTest, WhatCannotBeLearntIsStaleWithoutAMessage) {
 }
 
 TEST_F(ValidityTest, StatusOfAFrame) {
-  const struct {
+  const struct Span {
     std::int32_t start, count, field;
     std::int64_t ticks, frame;
     int status;
@@ -123,14 +123,14 @@ TEST_F(ValidityTest, StatusOfAFrame) {
       {10, 21, 0, 28224000, 14, 3}, {9, 5, 0, 28224000, 10, 3},   // extended
       {10, 20, 1, 28224000, 14, 3}, {12, 5, 0, 23543520, 14, 3},  // within, but of a shorter step
   };
-  for (const auto& [start, count, field, ticks, frame, status] : cases) {
-    layer().Change([&](LayerState& layer) {
-      layer.start_frame = start;
-      layer.length = count;
-      layer.field_type = field;
-      layer.ticks_per_frame = ticks;
+  for (const Span& c : cases) {
+    layer().Change([&c](LayerState& layer) {
+      layer.start_frame = c.start;
+      layer.length = c.count;
+      layer.field_type = c.field;
+      layer.ticks_per_frame = c.ticks;
     });
-    EXPECT_EQ(Status(frame), status) << start << " " << count << " " << frame;
+    EXPECT_EQ(Status(c.frame), c.status) << c.start << " " << c.count << " " << c.frame;
   }
   layer().Change([](LayerState& layer) { layer.ticks_per_frame = 28224000; });
   EXPECT_EQ(Status(14), 8);

@@ -320,7 +320,9 @@ TEST(FieldsTest, ChromaOfInterlacedFramesStaysInItsField) {
     frame->colorspace = AVCOL_SPC_BT709;
     // Red is 63, 102, 240 and blue 32, 240, 118, ITU-R BT.709 limited.
     constexpr int kCodes[3][2] = {{63, 32}, {102, 240}, {240, 118}};
-    EachWord(*frame, [&](int p, int, int y, auto& word) { word = kCodes[p][y % 2] << shift; });
+    EachWord(*frame, [&, shift = shift](int p, int, int y, auto& word) {
+      word = kCodes[p][y % 2] << shift;
+    });
     for (const auto& colours : {ColoursOf<HX_Pixel8>(*frame), ColoursOf<HX_Pixel16>(*frame)}) {
       for (int y = 0; y < kSize; ++y) {
         const Colour& colour = colours[y * kSize + 9];

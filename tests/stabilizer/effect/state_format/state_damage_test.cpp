@@ -78,7 +78,7 @@ TEST(StateDamageTest, WhatIsCutIsRefusedAndWhatIsFlippedIsRefusedOrLoads) {
     EXPECT_FALSE(loads(plain + '\0'));
     const std::size_t step = version == 16 ? 3 : 11;
     // Within a record's offsets all bytes are alike.
-    const auto alike = [&](std::size_t i) { return i > 3000 && i + 1000 < plain.size(); };
+    const auto alike = [end = plain.size()](std::size_t i) { return i > 3000 && i + 1000 < end; };
     for (std::size_t i = 0; i < plain.size(); i += alike(i) ? 397 : step) {
       ASSERT_FALSE(loads(plain.substr(0, i))) << i;
       std::string flipped = plain;
