@@ -331,8 +331,15 @@ host::Outcome SteadyClip::Measure() {
   if (drawn_) return outcome_;
   host::SavedEffect saved;
   const host::SolvedClip solved = Solved(&saved);
-  return host::MeasureOutcome(solved, host::FindBackground(solved),
-                              host::OwnWindows(solved, Zoom(solved)), FramesPerSecond());
+  const double zoom = Zoom(solved);
+  host::Outcome outcome = host::MeasureOutcome(solved, host::FindBackground(solved),
+                                               host::OwnWindows(solved, zoom), FramesPerSecond());
+  if (solved.crop) {  // the effect draws the window alone, which a maximum scale leaves small
+    const double across = std::min(1.0, zoom * solved.crop->width / solved.width);
+    const double down = std::min(1.0, zoom * solved.crop->height / solved.height);
+    outcome.most_black = std::max(outcome.most_black, 1 - across * down);
+  }
+  return outcome;
 }
 
 double SteadyClip::FramesPerSecond() const {

@@ -68,8 +68,7 @@ class SteadyClip {
   // where that is calmer, the frames as they were shot. What is saved stays as it was. Throws
   // SolveFailure.
   void FollowPicture(double most_zoom);
-  // After Work, with a framing that crops: what the output shows. What a maximum scale leaves empty
-  // beside the effect's own window is not seen here.
+  // After Work, with a framing that crops: what the output shows.
   host::Outcome Measure();
 
   // Throws SolveFailure where the effect can't be saved.
