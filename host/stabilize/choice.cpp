@@ -6,9 +6,8 @@
 namespace calmframe::host {
 namespace {
 
-Choice Follow(const SolvedClip& clip, const FollowSettings& settings, double frames_per_second,
-              Warps warps) {
-  const Background background = FindBackground(clip);
+Choice Follow(const SolvedClip& clip, const Background& background, const FollowSettings& settings,
+              double frames_per_second, Warps warps) {
   Choice choice{warps, FollowWindows(clip, background, settings), {}};
   choice.outcome = MeasureOutcome(clip, background, choice.windows, frames_per_second);
   choice.outcome.follows = true;
@@ -26,9 +25,11 @@ double CostOf(const Choice& choice, const ChoiceWeights& weights) {
 
 Choice Choose(const SolvedClip& clip, const FollowSettings& settings, double frames_per_second,
               bool may_leave_warps, const ChoiceWeights& weights) {
-  Choice solved = Follow(clip, settings, frames_per_second, Warps::solved);
+  const Background background = FindBackground(clip);
+  Choice solved = Follow(clip, background, settings, frames_per_second, Warps::solved);
   if (!may_leave_warps) return solved;
-  Choice none = Follow(WithoutWarps(clip), settings, frames_per_second, Warps::none);
+  Choice none = Follow(WithoutWarps(clip), {background.in_source, background.in_source}, settings,
+                       frames_per_second, Warps::none);
   return CostOf(none, weights) < CostOf(solved, weights) ? std::move(none) : std::move(solved);
 }
 

@@ -9,7 +9,7 @@
 namespace calmframe::host {
 namespace {
 
-// Vertices of a side, in an order that has the frame's inside on its left in a plane with y down.
+// Vertices of a side, in an order that has the frame's inside on its right in a plane with y down.
 std::vector<Point> Side(const WarpView& warp, int side) {
   std::vector<Point> points;
   const int last_column = warp.columns - 1, last_row = warp.rows - 1;
