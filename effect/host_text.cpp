@@ -45,6 +45,10 @@ void ReportOnFrame(const HostContext& context, const char* literal, std::int64_t
 
 void ShowMessage(const HostContext& context, const char* text) {
   context.out->out_flags |= HX_OUT_FLAG_SHOW_MESSAGE;
+  LeaveMessage(context, text);
+}
+
+void LeaveMessage(const HostContext& context, const char* text) {
   context.in->cb->copy_text(context.out->return_msg, HX_RETURN_MSG_SIZE, text);
 }
 

@@ -11,7 +11,9 @@ namespace kelp::effect {
 
 // Writes the return message, cut to its room between characters, and tells the host to show it.
 void ShowMessage(const HostContext& context, const char* text);
-// Takes that back: for failures that the user learns of in another way.
+// Writes it, and leaves it to the host whether it shows it.
+void LeaveMessage(const HostContext& context, const char* text);
+// Takes either back: for failures that the user learns of in another way.
 void ClearMessage(const HostContext& context);
 
 // Text to the host's form, at most `size` bytes with the terminating zero. Throws the host's code.

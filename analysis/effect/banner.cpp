@@ -60,17 +60,23 @@ void WriteAlpha(HX_World& world, std::uint8_t alpha) {
 }
 
 boost::shared_ptr<const BannerImage> GetImage(AnalysisEffect& effect, const StatusRecord& record) {
-  const char* const literal = effect.GetStatusMessage(record.status);
-  if (literal == nullptr) return {};
+  const std::string text = BannerText(effect, record);
+  if (text.empty()) return {};
   StatusRecord key = record;
   if (key.status != FrameStatus::GeneralFailure) key.text.clear();
   const boost::shared_ptr<std::mutex> mutex = effect.GetBannerCacheLock();
   const std::lock_guard<std::mutex> lock(*mutex);
-  return effect.GetBannerCache()->Get(
-      key, tessel::config::Localizer::Localize(key.text.empty() ? literal : key.text));
+  return effect.GetBannerCache()->Get(key, text);
 }
 
 }  // namespace
+
+std::string BannerText(AnalysisEffect& effect, const StatusRecord& record) {
+  const char* const literal = effect.GetStatusMessage(record.status);
+  if (literal == nullptr) return {};
+  const bool own = record.status == FrameStatus::GeneralFailure && !record.text.empty();
+  return tessel::config::Localizer::Localize(own ? record.text : literal);
+}
 
 BannerLayout LayOutBanner(std::int32_t image_width, std::int32_t image_height,
                           std::int32_t layer_width, std::int32_t layer_height, double downsample) {

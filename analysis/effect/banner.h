@@ -1,5 +1,7 @@
 #pragma once
 
+#include <string>
+
 #include "analysis/effect/analysis_effect.h"
 
 // The banner over a frame: a band across all of it, a little above its middle, with a text in its
@@ -23,6 +25,9 @@ BannerLayout LayOutBanner(std::int32_t image_width, std::int32_t image_height,
 // first one is that of every pixel.
 void PaintBand(HX_World& band, const tesselui::drawbot::Color& first,
                const tesselui::drawbot::Color& second);
+
+// What the record's banner says, in the user's language; empty for a status without a text.
+std::string BannerText(AnalysisEffect& effect, const StatusRecord& record);
 
 // Draws the record's banner over the output, of any depth; nothing for a status without a text. On
 // the render's thread. Whether the user wants it is the caller's to ask. Throws the host's code.

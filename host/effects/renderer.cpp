@@ -1,6 +1,7 @@
 #include "host/effects/renderer.h"
 
 #include <algorithm>
+#include <cstring>
 #include <memory>
 #include <new>
 #include <optional>
@@ -57,6 +58,12 @@ std::shared_ptr<WorldBuffer> PartOf(Host& host, const std::shared_ptr<WorldBuffe
                          whole.right - part->rect().left, whole.bottom - part->rect().top};
   CopyWorld(output->world(), part->world(), nullptr, &place);
   return part;
+}
+
+// The message of a render that doesn't ask for it to be shown. Throws std::bad_alloc.
+std::string BannerOf(const HX_OutData& out) {
+  if (out.out_flags & HX_OUT_FLAG_SHOW_MESSAGE) return {};
+  return {out.return_msg, strnlen(out.return_msg, sizeof out.return_msg)};
 }
 
 bool IsAbsurd(const HX_Rect& rect, const RenderContext& frames) {
@@ -158,9 +165,12 @@ void Renderer::DrawDirect(const RenderRequest& request, RenderedFrame& rendered)
     if (IsAbsurd(rendered.full_rect, frames)) {
       rendered.result.code = kBadRequest;
     } else if (auto output = OutputFor(host_, rendered.full_rect, request.bit_depth)) {
-      rendered.result = instance_->Call(HX_CMD_RENDER_FRAME, place, &output->world());
+      HX_OutData answer{};
+      rendered.result =
+          instance_->Call(HX_CMD_RENDER_FRAME, place, &output->world(), nullptr, &answer);
       CheckPadding(*output, host_);
       if (rendered.result.ok()) {
+        rendered.banner = BannerOf(answer);
         rendered.pixels =
             request.part ? PartOf(host_, output, *request.part, request.bit_depth) : output;
       }
@@ -195,9 +205,12 @@ void Renderer::DrawPlanned(const RenderRequest& request, RenderedFrame& rendered
   HX_RenderExtra render{};
   render.request = plan.request;
   SetRenderFunctions(render);
-  rendered.result = instance_->Call(HX_CMD_RENDER_PLANNED_FRAME, place, nullptr, &render);
+  HX_OutData answer{};
+  rendered.result = instance_->Call(HX_CMD_RENDER_PLANNED_FRAME, place, nullptr, &render, &answer);
   CheckPadding(*frames.output(), host_);
-  if (rendered.result.ok()) rendered.pixels = frames.output();
+  if (!rendered.result.ok()) return;
+  rendered.banner = BannerOf(answer);
+  rendered.pixels = frames.output();
 }
 
 }  // namespace calmframe::host

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <string>
 
 #include "host/effects/instance.h"
 #include "host/pixels/world_buffer.h"
@@ -25,7 +26,9 @@ struct RenderedFrame {
   std::shared_ptr<WorldBuffer> pixels;
   HX_Rect full_rect{};                    // all that the effect has to show for the frame
   int layer_width = 0, layer_height = 0;  // at render scale
-  std::uint64_t generation = 0;           // of the effect when the render began; see TimelineEffect
+  // What the effect's banner over the frame says, drawn or hidden; empty: it has none.
+  std::string banner;
+  std::uint64_t generation = 0;  // of the effect when the render began; see TimelineEffect
 
   // What the layer's own rectangle shows of it, clear where there is nothing.
   std::shared_ptr<WorldBuffer> OnLayer() const;

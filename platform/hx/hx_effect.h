@@ -34,7 +34,8 @@ enum {
 enum { HX_RETURN_MSG_SIZE = 256 /* bytes, with the terminating zero */ };
 
 /* HX_OutData.out_flags: show return_msg, whatever the result. All other bits are declarations to
- * the host. */
+ * the host. A render leaves what its frame's banner says in return_msg without this flag, whether
+ * the banner is drawn or hidden. */
 enum { HX_OUT_FLAG_SHOW_MESSAGE = 0x100 };
 
 /* Named tables of operations; see hx_suites.h. Any thread. */

@@ -48,7 +48,10 @@ class Banner : public PlayedPlugin {
         SCOPED_TRACE("1/" + std::to_string(den) + " at " + std::to_string(depth));
         const auto render = [&](bool hidden) {
           effect.SetParam(kHideBanner, hidden);
-          return Float(Render(*renderer, depth < 0, {kShown, std::abs(depth), {1, den}}));
+          const RenderedFrame frame =
+              Render(*renderer, depth < 0, {kShown, std::abs(depth), {1, den}});
+          EXPECT_EQ(frame.banner.empty(), !look) << frame.banner;
+          return Float(frame);
         };
         const auto shown = render(false), beneath = render(true);
         ASSERT_TRUE(shown && beneath);

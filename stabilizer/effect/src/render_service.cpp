@@ -1,6 +1,7 @@
 #include "stabilizer/effect/src/render_service.h"
 
 #include <algorithm>
+#include <string>
 #include <vector>
 
 #include "analysis/effect/analysis_ui_data.h"
@@ -240,6 +241,9 @@ void RenderService::Render(RenderFrames& frames, HX_World& output, std::int32_t 
   }
   if (!stabilized) pass_through();
   if (stabilized && record.status == FrameStatus::Ready) return;
+  const std::string text = analysis::effect::BannerText(effect_, record);
+  if (text.empty()) return;
+  LeaveMessage(context_, text.c_str());
   if (!effect_.IsBannerHidden()) analysis::effect::DrawBanner(effect_, record, output);
 }
 
