@@ -2,7 +2,9 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
+#include <optional>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -39,6 +41,22 @@ struct FrameTime {
   bool operator==(const FrameTime&) const = default;
 };
 
+// Frames of a clip, the end excluded.
+struct FrameRange {
+  std::size_t first = 0, end = 0;
+  std::size_t size() const { return end - first; }
+  bool Holds(const FrameRange& other) const { return first <= other.first && other.end <= end; }
+  bool operator==(const FrameRange&) const = default;
+};
+
+// Where a clip that is a part of a longer one begins there: at which frame, and at which of its
+// ticks.
+struct Cut {
+  std::size_t frame = 0;
+  std::int64_t pts = 0;
+  bool operator==(const Cut&) const = default;
+};
+
 // The file's colour tags as it has them, code points of ITU-T H.273 (2: unspecified).
 struct ColourTags {
   int primaries = 2;
@@ -66,11 +84,16 @@ struct ClipInfo {
   bool mirrored = false;  // left and right were swapped too, after the rotation
   ColourTags colour;
   FieldOrder field_order = FieldOrder::progressive;
-  int stream = -1;      // the video stream's place in the file
+  int stream = -1;         // the video stream's place in the file
+  std::optional<Cut> cut;  // of PartOf; then frames and times count from the part's first
   std::string warning;  // one line, empty when all is well: a damaged stream, and how many frames
                         // of it decode
   bool operator==(const ClipInfo&) const = default;
 };
+
+// The clip as whoever writes a part of it sees it; all of it is the clip itself. range: one frame
+// at least, of a clip that is no part.
+ClipInfo PartOf(const ClipInfo& clip, const FrameRange& range);
 
 // What stands behind a reader's info: frames; or still promises of the container; or promises that
 // the frames have broken, after which the reader and those made of it give no frame.
@@ -99,7 +122,11 @@ class ClipReader {
   // first on, spares decoding them once more, but has to look at how found() stands when it has
   // read them, and to open the clip anew where the promise is broken. A clip whose promises are not
   // worth much is decoded all the same.
-  static std::unique_ptr<ClipReader> OpenPromised(const std::string& path);
+  // With a `part`, which is asked once the times of all frames are known: the same of these frames
+  // alone; the others are neither decoded nor looked at, and cost a search from the start if they
+  // are asked for after all. Throws Failure (input), and what `part` throws.
+  using Part = std::function<FrameRange(const ClipInfo& clip)>;
+  static std::unique_ptr<ClipReader> OpenPromised(const std::string& path, const Part& part = {});
   virtual ~ClipReader() = default;
 
   // Another reader of the clip, with a place of its own. One of a file doesn't search it again for
@@ -127,7 +154,9 @@ struct EncodeSettings {
   bool overwrite = false;
 };
 
-// Writes a clip beside the source's other streams. Everything goes to a name of its own beside
+// Writes a clip beside the source's other streams; of a part what lies within it, by whole packets:
+// sound begins with the packet that is heard when the part begins, subtitles that last into it or
+// beyond it are cut, chapters too. Everything goes to a name of its own beside
 // `path`, which Finish renames; a writer destroyed before leaves nothing.
 class ClipWriter {
  public:

@@ -71,18 +71,20 @@ class FfmpegReader final : public ClipReader {
   // Leaves the frame in last_.
   void Fetch(std::size_t frame) {
     if (last_ && last_number_ == frame) return;
-    const bool ascending = last_ ? frame == last_number_ + 1 : frame == 0;
+    const std::size_t begin = first_pass_ ? first_pass_->range().first : 0;
+    const bool ascending = last_ ? frame == last_number_ + 1 : frame == begin;
     last_.reset();
-    if (ahead_ && (frame < ahead_->next() || frame > ahead_->next() + kSkippedAtMost)) {
+    if (ahead_ && (frame < ahead_->next() || frame > ahead_->next() + kSkippedAtMost ||
+                   frame >= ahead_->end())) {
       ahead_.reset();
     }
-    if (!ahead_ && first_pass_ && (frame > 0 || first_pass_->begun())) LeaveFirstPass();
+    if (!ahead_ && first_pass_ && (frame != begin || first_pass_->begun())) LeaveFirstPass();
     if (!ahead_ && ascending) {
       ahead_.emplace(
           [this](std::size_t number, const std::atomic<bool>& stop) {
             return first_pass_ ? first_pass_->Get(number, stop) : finder_->Get(number, stop);
           },
-          frame, info_.frame_count);
+          frame, EndAhead(frame));
     }
     if (ahead_) {
       while (ahead_->next() < frame) ahead_->Pop();
@@ -92,6 +94,12 @@ class FfmpegReader final : public ClipReader {
       last_ = finder_->Get(frame, never);
     }
     last_number_ = frame;
+  }
+
+  // Nobody decodes ahead of himself into what isn't known.
+  std::size_t EndAhead(std::size_t frame) const {
+    const std::size_t known = first_pass_ ? first_pass_->range().end : list_->known.end;
+    return frame < known ? known : info_.frame_count;
   }
 
   void LeaveFirstPass() {
@@ -117,8 +125,21 @@ class FfmpegReader final : public ClipReader {
 
 }  // namespace
 
-std::unique_ptr<ClipReader> ClipReader::OpenPromised(const std::string& path) {
-  if (auto first_pass = FirstPass::Begin(path)) {
+ClipInfo PartOf(const ClipInfo& clip, const FrameRange& range) {
+  if (range.size() == clip.frame_count) return clip;
+  ClipInfo part = clip;
+  part.frame_count = range.size();
+  part.cut = Cut{range.first, 0};
+  if (clip.times.empty()) return part;
+  const auto begin = clip.times.begin() + static_cast<std::ptrdiff_t>(range.first);
+  part.cut->pts = begin->pts;
+  part.times.assign(begin, begin + static_cast<std::ptrdiff_t>(range.size()));
+  for (FrameTime& time : part.times) time.pts -= part.cut->pts;
+  return part;
+}
+
+std::unique_ptr<ClipReader> ClipReader::OpenPromised(const std::string& path, const Part& part) {
+  if (auto first_pass = FirstPass::Begin(path, part)) {
     return std::make_unique<FfmpegReader>(std::move(first_pass));
   }
   return Open(path);
@@ -135,6 +156,7 @@ std::unique_ptr<ClipReader> ClipReader::Open(const std::string& path,
   }
   FrameList list;
   list.index = ScanFrames(path, list.info);
+  list.known.end = list.index.size();
   return std::make_unique<FfmpegReader>(std::make_shared<const FrameList>(std::move(list)));
 }
 

@@ -27,6 +27,7 @@ class DecodeAhead {
 
   // Number of the frame that Pop takes next; `end` when none is left.
   std::size_t next() const { return next_; }
+  std::size_t end() const { return end_; }
   // Waits for the next frame. The first failure is thrown, now and on every later call.
   FramePtr Pop();
 

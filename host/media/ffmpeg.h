@@ -10,6 +10,7 @@ extern "C" {
 #include <libavutil/mathematics.h>
 #include <libavutil/opt.h>
 #include <libavutil/pixdesc.h>
+#include <libavutil/timecode.h>
 #include <libswscale/swscale.h>
 }
 

@@ -162,6 +162,10 @@ std::uint64_t Fingerprint(const AVFrame& frame) {
   return hash;
 }
 
+IndexEntry EntryOf(const AVFrame& frame) {
+  return {OwnTime(frame), Fingerprint(frame), frame.key_frame != 0};
+}
+
 AVRational PixelAspect(const Decoder& decoder, const AVFrame& first) {
   return av_guess_sample_aspect_ratio(const_cast<AVFormatContext*>(&decoder.container()),
                                       const_cast<AVStream*>(&decoder.stream()),
@@ -212,7 +216,7 @@ void FrameScan::Add(const AVFrame& frame) {
   if (index_.size() == most_) {
     throw Failure(Failure::Side::input, path_ + ": more than " + std::to_string(most_) + " frames");
   }
-  index_.push_back({OwnTime(frame), Fingerprint(frame), frame.key_frame != 0});
+  index_.push_back(EntryOf(frame));
   times_.push_back({TimeOrNone(frame.best_effort_timestamp),
                     std::max<std::int64_t>(TimeOrNone(frame.pkt_duration), 0)});
   if (frame.interlaced_frame) {

@@ -26,6 +26,8 @@ struct IndexEntry {
 };
 using FrameIndex = std::vector<IndexEntry>;
 
+IndexEntry EntryOf(const AVFrame& frame);
+
 // How many of a clip's frames are interlaced.
 struct FieldCounts {
   std::size_t top_first = 0, bottom_first = 0;

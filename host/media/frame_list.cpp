@@ -10,10 +10,11 @@ namespace {
 
 using tessel::filesupport::StreamError;
 
-// 2: damaged streams are read by one thread. 3: the pixel format, and alpha of VP9. Goes up with
+// 2: damaged streams are read by one thread. 3: the pixel format, and alpha of VP9. 4: the frames
+// that are known. Goes up with
 // every change of what stands in the bytes, and of how ScanFrames numbers frames or what it tells
 // of them.
-constexpr std::uint32_t kVersion = 3;
+constexpr std::uint32_t kVersion = 4;
 
 constexpr std::size_t kLongestText = 200;
 // Of a frame in the inflated bytes: two times, the fingerprint, the keyframe's mark.
@@ -123,6 +124,8 @@ void WriteFrames(const FrameList& list, const Writer& write) {
   }
   for (const IndexEntry& entry : list.index) write(entry.keyframe);
   for (const IndexEntry& entry : list.index) write(entry.fingerprint);
+  write(std::uint64_t{list.known.first});
+  write(std::uint64_t{list.known.end});
 }
 
 void ReadFrames(tessel::filesupport::InputByteStream& in, FrameList& list) {
@@ -162,6 +165,11 @@ void ReadFrames(tessel::filesupport::InputByteStream& in, FrameList& list) {
   }
   for (IndexEntry& entry : list.index) in >> entry.keyframe;
   for (IndexEntry& entry : list.index) in >> entry.fingerprint;
+  std::uint64_t first, end;
+  in >> first;
+  in >> end;
+  if (first >= end || end > count) throw StreamError("no such frames");
+  list.known = {first, end};
 }
 
 }  // namespace

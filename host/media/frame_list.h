@@ -15,6 +15,8 @@ namespace calmframe::media {
 struct FrameList final : FoundFrames {
   ClipInfo info;
   FrameIndex index;  // one a frame
+  // Those that were decoded, beside frame 0; of the others the index has a time and no more.
+  FrameRange known;
 
   Standing standing() const override { return Standing::decoded; }
   std::vector<std::uint8_t> Bytes() const override;

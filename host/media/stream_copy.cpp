@@ -9,6 +9,11 @@
 namespace calmframe::media {
 namespace {
 
+// In AV_TIME_BASE ticks. Subtitles that began so long before a part are still found.
+constexpr std::int64_t kLongestText = 30 * std::int64_t{AV_TIME_BASE};
+// So far containers may lay the packets of one instant apart.
+constexpr std::int64_t kInterleaving = 10 * std::int64_t{AV_TIME_BASE};
+
 std::uint32_t TagFor(const AVOutputFormat& format, const AVCodecParameters& parameters) {
   unsigned tag = 0;
   const bool keeps =
@@ -40,6 +45,18 @@ bool AddStream(const AVStream& from, AVFormatContext& output) {
   return true;
 }
 
+// A clip's clock in its first frame, brought to that of the part's first.
+void AdvanceTimecode(const ClipInfo& source, AVDictionary*& tags) {
+  const AVDictionaryEntry* told = av_dict_get(tags, "timecode", nullptr, 0);
+  if (!told) return;
+  AVTimecode clock;
+  char text[AV_TIMECODE_STR_SIZE];
+  const bool known = av_timecode_init_from_string(&clock, ToRational(source.frame_rate),
+                                                  told->value, nullptr) >= 0;
+  if (known) av_timecode_make_string(&clock, text, static_cast<int>(source.cut->frame));
+  av_dict_set(&tags, "timecode", known ? text : nullptr, 0);
+}
+
 // Muxers say what they take only by writing a header, so one is written into memory.
 bool Takes(const AVOutputFormat& format, const AVStream& video, const AVStream& stream) {
   AVFormatContext* trial = nullptr;
@@ -67,7 +84,12 @@ StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVForma
   const bool broadcast = (input_->iformat->flags & AVFMT_TS_DISCONT) != 0;
   if (broadcast && !(std::strcmp(output.oformat->name, "mpegts") == 0) &&
       input_->start_time != AV_NOPTS_VALUE) {
-    offset_ = input_->start_time;
+    offset_ = {input_->start_time, AV_TIME_BASE_Q};
+  }
+  if (source.cut && !source.times.empty()) {
+    cut_ = true;
+    offset_ = {source.cut->pts, ToRational(source.time_base)};
+    length_ = {source.times.back().pts + source.times.back().duration, offset_.base};
   }
   for (unsigned i = 0; i < input_->nb_streams; ++i) {
     AVStream& from = *input_->streams[i];
@@ -93,6 +115,15 @@ StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVForma
     av_dict_set(&output.metadata, key, nullptr, 0);
   }
   CopyChapters();
+  if (!cut_) return;
+  for (AVDictionary** tags : {&output.metadata, &output.streams[0]->metadata}) {
+    AdvanceTimecode(source, *tags);
+  }
+  // Where that can't be, what lies before the part is read and dropped.
+  const std::int64_t from = offset_.In(AV_TIME_BASE_Q) - kLongestText;
+  if (input_->start_time == AV_NOPTS_VALUE || from > input_->start_time) {
+    av_seek_frame(input_.get(), -1, from, AVSEEK_FLAG_BACKWARD);
+  }
 }
 
 void StreamCopy::CopyVideoProperties(const AVStream& from, AVStream& to) {
@@ -125,15 +156,37 @@ void StreamCopy::CopyChapters() {
     const AVChapter& from = *input_->chapters[i];
     if (TimeOrNone(from.start) == AV_NOPTS_VALUE || TimeOrNone(from.end) == AV_NOPTS_VALUE)
       continue;
+    const std::int64_t shift = offset_.In(from.time_base);
+    std::int64_t end = from.end - shift;
+    if (cut_) end = std::min(end, length_.In(from.time_base));
+    if (cut_ && end <= std::max<std::int64_t>(from.start - shift, 0)) continue;
     auto* to = static_cast<AVChapter*>(NotNull(av_mallocz(sizeof(AVChapter))));
-    const std::int64_t shift = av_rescale_q(offset_, AV_TIME_BASE_Q, from.time_base);
     to->id = from.id;
     to->time_base = from.time_base;
     to->start = std::max<std::int64_t>(from.start - shift, 0);
-    to->end = std::max(from.end - shift, to->start);
+    to->end = std::max(end, to->start);
     output_.chapters[output_.nb_chapters++] = to;
     CopyTags(from.metadata, to->metadata);
   }
+}
+
+bool StreamCopy::Cut(const AVStream& from, AVPacket& packet) {
+  if (from.disposition & AV_DISPOSITION_ATTACHED_PIC) {  // stands for the whole clip
+    packet.pts = packet.dts = 0;
+    return true;
+  }
+  const std::int64_t length = length_.In(from.time_base);
+  const std::int64_t begin = packet.pts != AV_NOPTS_VALUE ? packet.pts : packet.dts;
+  if (begin == AV_NOPTS_VALUE) return false;
+  const std::int64_t end = begin + std::max<std::int64_t>(TimeOrNone(packet.duration), 1);
+  if (begin >= length || end <= 0) return false;
+  if (from.codecpar->codec_type == AVMEDIA_TYPE_SUBTITLE && packet.duration > 0) {
+    packet.pts = packet.dts = std::max<std::int64_t>(begin, 0);
+    packet.duration = std::min(end, length) - packet.pts;
+  }
+  if (begun_.count(packet.stream_index) == 0 && !(packet.flags & AV_PKT_FLAG_KEY)) return false;
+  begun_.insert(packet.stream_index);
+  return true;
 }
 
 PacketPtr StreamCopy::Next() {
@@ -145,9 +198,10 @@ PacketPtr StreamCopy::Next() {
       av_packet_unref(packet.get());
       continue;
     }
-    const AVRational from = input_->streams[packet->stream_index]->time_base;
+    const AVStream& stream = *input_->streams[packet->stream_index];
+    const AVRational from = stream.time_base;
     const AVRational to = output_.streams[found->second]->time_base;
-    const std::int64_t shift = av_rescale_q(offset_, AV_TIME_BASE_Q, from);
+    const std::int64_t shift = offset_.In(from);
     packet->pts = TimeOrNone(packet->pts);
     packet->dts = TimeOrNone(packet->dts);
     if (packet->pts != AV_NOPTS_VALUE) packet->pts -= shift;
@@ -155,6 +209,14 @@ PacketPtr StreamCopy::Next() {
       packet->dts = packet->pts;
     } else {
       packet->dts -= shift;
+    }
+    if (cut_ && !Cut(stream, *packet)) {
+      const bool beyond =
+          packet->dts != AV_NOPTS_VALUE && av_rescale_q(packet->dts, from, AV_TIME_BASE_Q) >
+                                               length_.In(AV_TIME_BASE_Q) + kInterleaving;
+      if (beyond) return nullptr;
+      av_packet_unref(packet.get());
+      continue;
     }
     av_packet_rescale_ts(packet.get(), from, to);
     packet->stream_index = found->second;

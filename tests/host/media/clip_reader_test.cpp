@@ -69,6 +69,23 @@ TEST_F(ClipReaderTest, EachWayInAndAnyOrderGivesTheFramesThatTheSequenceGives) {
         EXPECT_TRUE(SamePixels(ReadFrame(one, frame + 1), frames[frame + 1])) << frame;
       }
     }
+    const FrameRange part{clip.frames / 2 - 5, clip.frames / 2 + 7};
+    const auto of_part = ClipReader::OpenPromised(In(clip.name), [&](const ClipInfo& whole) {
+      EXPECT_EQ(whole, info);
+      return part;
+    });
+    const auto ask = [&](ClipReader& one, std::size_t frame) {
+      EXPECT_TRUE(SamePixels(ReadFrame(one, frame), frames[frame])) << frame << " of a part";
+    };
+    for (std::size_t i = part.first; i < part.end; ++i) ask(*of_part, i);
+    ASSERT_EQ(of_part->found()->standing(), Standing::decoded);
+    const auto part_known = ClipReader::Open(In(clip.name), of_part->found()->Bytes());
+    EXPECT_EQ(part_known->info(), info);
+    for (const std::size_t i : {part.end - 1, part.first, part.first + 1, std::size_t{0}, part.end,
+                                clip.frames - 1, part.first}) {
+      ask(*of_part, i);
+      ask(*part_known, i);
+    }
     ReadFrame(*ClipReader::Open(In(clip.name)), 0);  // and dropped while it decodes ahead
   }
 }
@@ -99,6 +116,31 @@ TEST_F(ClipReaderTest, AnyOrderIsRightWhileFramesAreStillPromised) {
     }
   }
   ReadFrame(*ClipReader::OpenPromised(In("a.mp4")), 0);
+}
+
+TEST_F(ClipReaderTest, OfAPartTheRestIsNotLookedAt) {
+  for (const std::string name : {"a.mov", "a.avi"}) {
+    SCOPED_TRACE(name);
+    Ffmpeg("-f lavfi -i testsrc=s=96x64:r=30:d=2 -c:v mjpeg -q:v 2 " + In(name));
+    const auto whole = ClipReader::Open(In(name));
+    std::string bytes = Content(name);
+    for (const auto& [from, to] : {std::pair{0.2, 0.35}, {0.75, 0.85}}) {
+      for (auto at = static_cast<std::size_t>(from * bytes.size()); at < to * bytes.size();
+           at += 7) {
+        bytes[at] ^= 0x55;
+      }
+    }
+    MakeFile("damaged" + name, bytes);
+    const FrameRange part{27, 41};
+    const auto read =
+        ClipReader::OpenPromised(In("damaged" + name), [&](const ClipInfo&) { return part; });
+    for (std::size_t i = part.first; i < part.end; ++i) {
+      EXPECT_TRUE(SamePixels(ReadFrame(*read, i), ReadFrame(*whole, i))) << i;
+    }
+    EXPECT_EQ(read->found()->standing(), Standing::decoded);
+    EXPECT_EQ(read->info().warning, "");
+    EXPECT_NE(ClipReader::Open(In("damaged" + name))->info().warning, "");
+  }
 }
 
 TEST_F(ClipReaderTest, WhatIsCutShortGivesWhatDecodesAndIsTold) {

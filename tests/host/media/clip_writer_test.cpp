@@ -1,8 +1,11 @@
 #include <sys/resource.h>
 
 #include <algorithm>
+#include <array>
 #include <cmath>
 #include <csignal>
+#include <cstring>
+#include <sstream>
 
 #include "tests/host/media/clip_fixture.h"
 
@@ -112,6 +115,118 @@ TEST_F(ClipTest, VariableRateAndOtherStreamsGoThroughUntouched) {
   }
   const std::string bytes = Content("out.mp4");
   EXPECT_LT(bytes.find("moov"), bytes.find("mdat"));
+}
+
+double StartOf(const std::string& path) {
+  return std::stod(Output(
+      "ffprobe -v error -select_streams v -show_entries stream=start_time -of csv=p=0 " + path));
+}
+
+// Where the first loud sample is, and the last one of all, in seconds from the first frame.
+struct Sound {
+  double beep, end;
+};
+Sound SoundOf(const std::string& path) {
+  constexpr int kRate = 48000;
+  const std::string heard =
+      Output("ffmpeg -v error -copyts -i " + path +
+             " -map 0:a -af aresample=async=1:first_pts=0 -ac 1 -ar 48000 -f s16le -");
+  std::vector<std::int16_t> samples(heard.size() / 2);
+  std::memcpy(samples.data(), heard.data(), 2 * samples.size());
+  const auto beep = std::find_if(samples.begin(), samples.end(),
+                                 [](std::int16_t sample) { return std::abs(sample) > 1000; });
+  const auto seconds = [&](auto place) {
+    return static_cast<double>(place - samples.begin()) / kRate - StartOf(path);
+  };
+  return {seconds(beep), seconds(samples.end())};
+}
+
+// Ten seconds in, of half an hour by its clock: a beep of a tenth of a second 0.5 s after the cut,
+// captions before, in and behind it.
+TEST_F(ClipTest, APartTakesWhatLiesWithinItAndStaysInTime) {
+  MakeFile("s.srt",
+           "1\n00:00:02,000 --> 00:00:03,000\ngone\n\n2\n00:00:09,500 --> 00:00:10,400\ninto\n\n"
+           "3\n00:00:10,600 --> 00:00:10,800\nwhole\n\n4\n00:00:11,200 --> 00:00:13,000\nout\n");
+  MakeFile("chapters",
+           ";FFMETADATA1\n[CHAPTER]\nTIMEBASE=1/1000\nSTART=0\nEND=9000\ntitle=A\n[CHAPTER]\n"
+           "TIMEBASE=1/1000\nSTART=9000\nEND=11000\ntitle=B\n[CHAPTER]\nTIMEBASE=1/1000\n"
+           "START=11000\nEND=14000\ntitle=C\n");
+  const std::string sound =
+      "-f lavfi -i \"aevalsrc='sin(2*PI*2000*t)*between(t,10.5,10.6):s=48000:d=14'\" ";
+  const struct {
+    const char *in, *out, *codecs;
+  } cases[] = {{"a.mp4", "part.mp4", "-c:a aac -c:s mov_text"},
+               {"a.mkv", "part.mkv", "-c:a aac -c:s srt"},
+               {"a.mov", "part.mov", "-c:a pcm_s16le -c:s mov_text"},
+               {"b.mp4", "opus.mp4", "-c:a libopus -sn"}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(testing::Message() << c.in << " to " << c.out);
+    Ffmpeg("-f lavfi -i testsrc2=s=64x48:r=30:d=14 " + sound + "-i " + In("s.srt") + " -i " +
+           In("chapters") +
+           " -map 0 -map 1 -map 2 -map_chapters 3 -vf \"select='not(eq(mod(n,7),3))'\" -vsync vfr "
+           "-c:v libx264 -g 30 -timecode 00:30:00:00 -t 14 " +
+           c.codecs + " " + In(c.in));
+    const auto reader = ClipReader::Open(In(c.in));
+    const ClipInfo& whole = reader->info();
+    const auto seconds = [](const ClipInfo& clip, std::size_t i) {
+      return static_cast<double>(clip.times[i].pts - clip.times[0].pts) * clip.time_base.num /
+             clip.time_base.den;
+    };
+    FrameRange range{0, whole.frame_count};
+    while (seconds(whole, range.first) < 9.9999) ++range.first;
+    while (seconds(whole, range.end - 1) > 11.9999) --range.end;
+    const ClipInfo part = PartOf(whole, range);
+    WriteClip(In(c.out), part, [&](int frame, HX_Pixel8* pixels) {
+      reader->Read(range.first + static_cast<std::size_t>(frame), pixels, 64 * 4);
+    });
+    const auto written = ClipReader::Open(In(c.out));
+    ASSERT_EQ(written->info().frame_count, range.size());
+    for (std::size_t i = 0; i < range.size(); ++i) {
+      EXPECT_NEAR(seconds(written->info(), i),
+                  seconds(whole, range.first + i) - seconds(whole, range.first), 0.00101);
+    }
+    const Sound before = SoundOf(In(c.in)), after = SoundOf(In(c.out));
+    EXPECT_NEAR(after.beep, before.beep - seconds(whole, range.first), 0.0011);
+    // No more of it than a packet.
+    const double length =
+        seconds(part, range.size() - 1) +
+        static_cast<double>(part.times.back().duration) * part.time_base.num / part.time_base.den;
+    EXPECT_NEAR(after.end, length, 0.022);
+    const double zero = StartOf(In(c.out));
+    // Of B the second half; Matroska's own clock begins with the sound's priming.
+    std::istringstream chapters(Output(
+        "ffprobe -v error -show_entries chapter=start_time,end_time -of csv=p=0 " + In(c.out)));
+    double from, to;
+    for (const auto& [begins, ends] : {std::pair{0.0, 1.0}, {1.0, 2.033}}) {
+      char comma;
+      chapters >> from >> comma >> to;
+      EXPECT_NEAR(from, begins, 0.022);
+      EXPECT_NEAR(to, ends, 0.022);
+    }
+    EXPECT_FALSE(chapters >> from) << "a third one";
+    if (std::string(c.in) == "a.mov") {
+      EXPECT_THAT(Output("ffprobe -v error -show_entries stream_tags=timecode " + In(c.out)),
+                  HasSubstr("00:30:09:23"));  // 257 frames on, 26 to a second
+    }
+    // Begin, length and bytes; of those without a text two.
+    std::istringstream packets(Output(
+        "ffprobe -v error -select_streams s -show_entries packet=pts_time,duration_time,size "
+        "-of csv=p=0 " +
+        In(c.out)));
+    std::vector<std::array<double, 2>> texts;
+    double begin, lasts;
+    for (char comma; packets >> begin >> comma >> lasts >> comma;) {
+      int size;
+      packets >> size;
+      if (size > 2) texts.push_back({begin - zero, lasts});
+    }
+    const std::vector<std::array<double, 2>> expected = {{0, 0.4}, {0.6, 0.2}, {1.2, 0.8}};
+    ASSERT_EQ(texts.size(), std::string(c.codecs).find("-sn") == std::string::npos ? 3u : 0u);
+    for (std::size_t i = 0; i < texts.size(); ++i) {
+      EXPECT_NEAR(texts[i][0], expected[i][0], 0.002) << i;
+      EXPECT_NEAR(texts[i][1], expected[i][1], i == 2 ? 0.04 : 0.002) << i;
+    }
+  }
 }
 
 TEST_F(ClipTest, TagsAspectAndFieldsAreKept) {

@@ -43,11 +43,13 @@ TEST_F(FrameListTest, AnHourTakesSomeNineBytesAFrame) {
   list.info.width = list.info.height = 16;
   list.info.frame_count = kFrames;
   list.info.stream = 0;
+  list.known = {70'000, 80'000};
   const Bytes bytes = list.Bytes();
   EXPECT_LT(bytes.size(), 10 * kFrames);
   const std::optional<FrameList> read = FrameListOf(bytes, "a");
   ASSERT_TRUE(read);
   EXPECT_EQ(read->info, list.info);
+  EXPECT_EQ(read->known, list.known);
   const auto all = [](const IndexEntry& of) {
     return std::tuple(of.pts, of.fingerprint, of.keyframe);
   };
