@@ -97,9 +97,7 @@ const std::vector<Flag>& Flags() {
       {"--synthesis-input-range", Slider{HX_SYNTHESIS_INPUT_RANGE, "SECONDS"},
        "How far away in time synthesize-edges looks for pixels; more fills more and is slower"},
       {"--synthesis-edge-feather", Slider{HX_SYNTHESIS_EDGE_FEATHER, "PIXELS"},
-       "How softly synthesize-edges joins one frame to another"},
-      {"--hide-warning-banner", Switch{HX_HIDE_WARNING_BANNER},
-       "Draw no banner over frames that could not be steadied as asked"}};
+       "How softly synthesize-edges joins one frame to another"}};
   return flags;
 }
 
@@ -203,6 +201,8 @@ void AddControlFlags(CLI::App& command, ControlFlags& flags) {
       ->group(kFinerControls);
   command.add_flag("--experimental", flags.experimental, "Offer the experimental parameters too")
       ->group(kFinerControls);
+  // Of 0.1.0; what it asked for is so without it.
+  command.add_flag("--hide-warning-banner")->group("");
 }
 
 bool HasFlag(std::int32_t disk_id) {

@@ -73,7 +73,7 @@ void RenderCommand::Run() {
   TellLosses(*writer, progress);
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   Frame(*clip, flags_.window, progress);
-  RenderClip(*clip, range, {.depth = flags_.depth, .threads = run_.threads}, *writer, progress);
+  RenderClip(*clip, range, SettingsOf(flags_, run_.threads), *writer, progress);
   TellOutcome(*clip, progress);
   unsaved.Throw();
 }

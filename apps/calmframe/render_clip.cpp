@@ -20,7 +20,11 @@
 namespace calmframe {
 namespace {
 
-using FramePixels = std::shared_ptr<host::WorldBuffer>;
+// A frame as it is to be written.
+struct DrawnFrame {
+  std::shared_ptr<host::WorldBuffer> pixels;
+  std::string banner;  // what the effect's banner over it says; empty: it has none
+};
 
 // The lines of one parity (0: lines 0, 2, 4 ...).
 void CopyField(const host::WorldBuffer& from, int parity, host::WorldBuffer& to) {
@@ -31,10 +35,10 @@ void CopyField(const host::WorldBuffer& from, int parity, host::WorldBuffer& to)
   }
 }
 
-// A frame as it is to be written. The fields of an interlaced one were shot one after the other, so
-// each is rendered for its own instant and gives its lines.
-FramePixels RenderFrame(host::Renderer& renderer, std::int64_t frame,
-                        const RenderSettings& settings, media::FieldOrder order) {
+// The fields of an interlaced frame were shot one after the other, so each is rendered for its own
+// instant and gives its lines.
+DrawnFrame RenderFrame(host::Renderer& renderer, std::int64_t frame, const RenderSettings& settings,
+                       media::FieldOrder order) {
   const auto render = [&](bool second_field) {
     host::RenderRequest request;
     request.frame = frame;
@@ -45,12 +49,13 @@ FramePixels RenderFrame(host::Renderer& renderer, std::int64_t frame,
     if (!rendered.result.ok()) {
       throw SolveFailure(rendered.result.Line("frame " + std::to_string(frame)));
     }
-    return rendered.OnLayer();
+    return DrawnFrame{rendered.OnLayer(), rendered.banner};
   };
-  FramePixels first = render(false);
+  DrawnFrame first = render(false);
   if (order == media::FieldOrder::progressive) return first;
-  const FramePixels second = render(true);
-  CopyField(*second, order == media::FieldOrder::top_first ? 1 : 0, *first);
+  const DrawnFrame second = render(true);
+  CopyField(*second.pixels, order == media::FieldOrder::top_first ? 1 : 0, *first.pixels);
+  if (first.banner.empty()) first.banner = second.banner;
   return first;
 }
 
@@ -78,15 +83,15 @@ class RenderAhead {
   RenderAhead& operator=(const RenderAhead&) = delete;
 
   // In ascending order. Throws what its render threw.
-  FramePixels Take(std::int64_t frame) {
+  DrawnFrame Take(std::int64_t frame) {
     std::unique_lock lock(mutex_);
     taken_ = frame;
     changed_.notify_all();
     changed_.wait(lock, [&] { return failure_ || done_.count(frame) > 0; });
     if (failure_) std::rethrow_exception(failure_);
-    FramePixels pixels = std::move(done_.at(frame));
+    DrawnFrame drawn = std::move(done_.at(frame));
     done_.erase(frame);
-    return pixels;
+    return drawn;
   }
 
  private:
@@ -108,9 +113,9 @@ class RenderAhead {
         if (stopped_ || failure_ || next_ >= end_) return;
         const std::int64_t frame = next_++;
         lock.unlock();
-        FramePixels pixels = RenderFrame(*renderer, frame, settings_, clip_.info().field_order);
+        DrawnFrame drawn = RenderFrame(*renderer, frame, settings_, clip_.info().field_order);
         lock.lock();
-        done_[frame] = std::move(pixels);
+        done_[frame] = std::move(drawn);
         changed_.notify_all();
       }
     } catch (...) {
@@ -127,7 +132,7 @@ class RenderAhead {
   std::mutex mutex_;           // guards all below but the threads
   std::condition_variable changed_;
   std::int64_t next_, taken_;
-  std::map<std::int64_t, FramePixels> done_;
+  std::map<std::int64_t, DrawnFrame> done_;
   std::exception_ptr failure_;
   bool stopped_ = false;
   std::vector<std::thread> threads_;
@@ -175,12 +180,25 @@ void MakeRoomForNeighbours(SteadyClip& clip, int depth, int threads) {
   clip.host().media().SetCacheBytes(static_cast<std::size_t>(std::min(frames * frame, kMost)));
 }
 
+// Of so many frames, the numbers of those with a banner by what it says.
+std::vector<std::string> BannerLines(const std::map<std::string, std::size_t>& banners,
+                                     std::size_t frames) {
+  std::vector<std::string> lines;
+  for (const auto& [text, count] : banners) {
+    lines.push_back(std::to_string(count) + " of " + std::to_string(frames) +
+                    (frames == 1 ? " frame" : " frames") +
+                    " could not be steadied as asked: " + text);
+  }
+  return lines;
+}
+
 }  // namespace
 
-void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
-                  const std::string& stage, ProgressLine& progress,
-                  const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
-                  const std::function<void()>& finish) {
+std::vector<std::string> RenderFrames(
+    SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+    const std::string& stage, ProgressLine& progress,
+    const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
+    const std::function<void()>& finish) {
   RenderSettings own = settings;
   if (own.depth == 0) own.depth = DepthFor(clip);
   if (own.threads == 0) {
@@ -189,13 +207,20 @@ void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSetting
   constexpr int kMostInWork = 8;  // each holds some frames; the strips of one use all processors
   own.threads = std::min(own.threads, kMostInWork);
   MakeRoomForNeighbours(clip, own.depth, own.threads);
+  host::Effect& drawn = clip.drawn();
+  const std::int32_t hides = drawn.IndexOf(HX_HIDE_WARNING_BANNER.disk_id);
+  const host::CommandResult told = drawn.SetParam(hides, own.warning_banner ? 0 : 1);
+  if (!told.ok()) throw SolveFailure(told.Line(clip.path()));
+  std::map<std::string, std::size_t> banners;
   RenderAhead frames(clip, range, own);
   Progress shown{stage, 0, static_cast<double>(range.end - range.first), "frames", "", false};
   for (std::size_t frame = range.first; frame < range.end; ++frame) {
     if (InterruptAsked()) throw Interrupted();
     shown.done = static_cast<double>(frame - range.first);
     progress.Show(shown);
-    take(frame, *frames.Take(static_cast<std::int64_t>(frame)));
+    const DrawnFrame made = frames.Take(static_cast<std::int64_t>(frame));
+    if (!made.banner.empty()) ++banners[made.banner];
+    take(frame, *made.pixels);
   }
   clip.CheckMedia();
   if (finish) {
@@ -208,6 +233,7 @@ void RenderFrames(SteadyClip& clip, const FrameRange& range, const RenderSetting
   shown.done = shown.total;
   shown.ends = true;
   progress.Show(shown);
+  return BannerLines(banners, range.end - range.first);
 }
 
 void TellLosses(const media::ClipWriter& writer, ProgressLine& progress) {
@@ -216,12 +242,13 @@ void TellLosses(const media::ClipWriter& writer, ProgressLine& progress) {
 
 void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
                 media::ClipWriter& writer, ProgressLine& progress) {
-  RenderFrames(
+  const std::vector<std::string> said = RenderFrames(
       clip, range, settings, "rendering", progress,
       [&](std::size_t frame, const host::WorldBuffer& pixels) {
         Write(writer, frame - range.first, pixels);
       },
       [&writer] { writer.Finish(); });
+  for (const std::string& line : said) progress.Warn(line);
   TellLosses(writer, progress);
 }
 

@@ -119,23 +119,23 @@ std::vector<report::FilmFrame> Moments(const media::ClipInfo& info) {
   return film;
 }
 
-// Draws the whole clip, small: how much of each frame is left empty, percent, and the pictures of
-// the film's moments.
+// Draws the whole clip, small: how much of each frame is left empty, percent, the pictures of the
+// film's moments, and what the effect says of frames.
 std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
-                         std::vector<report::FilmFrame>& film) {
+                         std::vector<report::FilmFrame>& film, std::vector<std::string>& said) {
   const media::ClipInfo& info = clip.info();
   const double aspect = PixelAspectOf(info);
   std::vector<double> empty;
   std::size_t next = 0;
   RenderSettings settings{.depth = 8, .threads = threads};
   settings.downsample = std::clamp(info.width / kPictureWidth, 1, kMostDownsampled);
-  RenderFrames(clip, {0, info.frame_count}, settings, "drawing", progress,
-               [&](std::size_t frame, const host::WorldBuffer& pixels) {
-                 empty.push_back(100 * EmptyShare(pixels));
-                 if (next < film.size() && frame == film[next].frame) {
-                   film[next++].after = DataUrlOf(ViewOf(pixels, aspect), kPictureWidth);
-                 }
-               });
+  said = RenderFrames(clip, {0, info.frame_count}, settings, "drawing", progress,
+                      [&](std::size_t frame, const host::WorldBuffer& pixels) {
+                        empty.push_back(100 * EmptyShare(pixels));
+                        if (next < film.size() && frame == film[next].frame) {
+                          film[next++].after = DataUrlOf(ViewOf(pixels, aspect), kPictureWidth);
+                        }
+                      });
   // From the source that has drawn the frames: another reader would search the file for them again.
   const host::SourcePtr source = clip.effect().shared()->layer()->state()->source;
   for (report::FilmFrame& moment : film) {
@@ -226,7 +226,11 @@ void ReportCommand::Run() {
     const std::size_t rows = std::max<std::size_t>(solved.tracked.size(), 1);
     page.seconds_a_value = static_cast<double>(info.frame_count) / rate / static_cast<double>(rows);
     std::vector<report::FilmFrame> film = Moments(info);
-    const std::vector<double> empty = Draw(*clip, run_.threads, progress, film);
+    std::vector<std::string> said;
+    const std::vector<double> empty = Draw(*clip, run_.threads, progress, film, said);
+    for (const std::string& line : said) {
+      if (!trouble.nothing_seen) note(line);
+    }
     if (gone.empty()) page.film = std::move(film);
     // Saved work doesn't keep how the models were chosen: a solve of the same tells it again. It
     // comes last, since tracks are saved in steps of 1/32 pixel, which moves its warps a little.

@@ -160,9 +160,17 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
       {"8", "16", "32"},
       "Bits of a component while frames are drawn; at first 8, or 16 for deeper clips and for "
       "synthesize-edges");
+  CLI::Option* const banner = AddSwitch(
+      command, "--warning-banner", flags.warning_banner,
+      "Draw a banner over frames that could not be steadied as asked; what it says is told in a "
+      "line in any case");
   CLI::Option* const overwrite =
       AddSwitch(command, "--overwrite", flags.encode.overwrite, "Replace OUT where it exists");
-  PutInGroup("Output", {crf, codec, pixel_format, depth, overwrite});
+  PutInGroup("Output", {crf, codec, pixel_format, depth, banner, overwrite});
+}
+
+RenderSettings SettingsOf(const OutputFlags& flags, int threads) {
+  return {.depth = flags.depth, .threads = threads, .warning_banner = flags.warning_banner};
 }
 
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
@@ -180,8 +188,7 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
     TellLosses(*writer, progress);
     const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
     Frame(*clip, flags.window, progress);
-    RenderClip(*clip, {0, info.frame_count}, {.depth = flags.depth, .threads = threads}, *writer,
-               progress);
+    RenderClip(*clip, {0, info.frame_count}, SettingsOf(flags, threads), *writer, progress);
     TellOutcome(*clip, progress);
     unsaved.Throw();
   });

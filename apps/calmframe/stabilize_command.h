@@ -6,6 +6,7 @@
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
+#include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/steady_clip.h"
 #include "host/media/clip.h"
 
@@ -37,8 +38,10 @@ struct OutputFlags {
   WindowFlags window;
   media::EncodeSettings encode;
   int depth = 0;  // see RenderClip
+  bool warning_banner = false;
 };
 void AddOutputFlags(CLI::App& command, OutputFlags& flags);
+RenderSettings SettingsOf(const OutputFlags& flags, int threads);
 
 // From a file to a file. `project`: where saved work is taken up, if it is there, and left; empty
 // for none. Throws media::Failure, UsageFailure, SolveFailure, host::ProjectFailure, Interrupted.

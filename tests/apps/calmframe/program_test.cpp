@@ -186,6 +186,31 @@ TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
   RunWell("analyze in.mkv --project p.calm --quiet --framing synthesize-edges");
 }
 
+TEST_F(ProgramTest, ABannerIsToldInALineAndDrawnWhereItIsAskedFor) {
+  // Of 160 pixels 45 stay in view, below two fifths.
+  MakeWall("in.mkv", Made(160, 120, 24, 25), [](double t) { return Camera{5 * t}; });
+  const std::string says =
+      "24 of 24 frames could not be steadied as asked: To avoid extreme cropping set Framing to "
+      "Stabilize Only or adjust other parameters.";
+  const auto drawn = [&](const std::string& command) {
+    EXPECT_THAT(RunWell(command + " o.mkv --overwrite --crf 0 --quiet"), HasSubstr(says + "\n"));
+    return ReadFrame(*ClipReader::Open(Path("o.mkv")), 12);
+  };
+  const std::string work = "stabilize in.mkv --project p.calm --result no-motion --framing crop ";
+  const auto bare = drawn(work + "--param \"Hide Warning Banner=off\"");
+  EXPECT_TRUE(SamePixels(drawn("render --project p.calm"), bare));
+  EXPECT_TRUE(SamePixels(drawn(work + "--hide-warning-banner"), bare));
+  // Whatever saved work says of it, and a flat red bar from side to side.
+  const auto with = drawn(work + "--param \"Hide Warning Banner=on\" --warning-banner");
+  const auto is_red = [](const HX_Pixel8& p) { return p.red > p.blue + 90; };
+  EXPECT_EQ(std::count_if(bare.begin(), bare.end(), is_red), 0);
+  EXPECT_GE(std::count_if(with.begin(), with.end(), is_red), 160 * 4);
+  EXPECT_TRUE(SamePixels(drawn("render --project p.calm --warning-banner"), with));
+  EXPECT_THAT(Run("params --project p.calm").text, HasSubstr("now on\n"));
+  EXPECT_THAT(RunWell("report p.calm p.html --quiet"), HasSubstr(says));
+  EXPECT_THAT(Content("p.html"), HasSubstr(says + "</li>"));
+}
+
 TEST_F(ProgramTest, InputThatIsNoClip) {
   MakeFile("empty.mp4", "");
   MakeFile("garbage.mp4", std::string(5000, 'x'));
@@ -274,7 +299,7 @@ TEST_F(ProgramTest, ParametersAreListedWithWhatWasGiven) {
       {"Rolling Shutter Ripple", {"--rolling-shutter-ripple enhanced", 2}},
       {"Synthesis Input Range (seconds)", {"--synthesis-input-range 0.25", 0.25}},
       {"Synthesis Edge Feather", {"--synthesis-edge-feather 6", 6}},
-      {"Hide Warning Banner", {"--hide-warning-banner", 1}},
+      {"Hide Warning Banner", {"--param \"Hide Warning Banner=on\"", 1}},
       {"Rank", {"--experimental --param Rank=4", 4}},
       {"Max Count, 0=auto", {"--param \"max count, 0=auto=7\"", 7}}};
   std::string all = "params --json";
