@@ -24,6 +24,7 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
   AddFile(parser_, "IN", input_,
           "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
   AddControlFlags(parser_, controls_);
+  AddStretchFlags(parser_, stretch_, BareNumber::seconds);
   AddProjectFlag(parser_, project_);
   AddRunFlags(parser_, run_);
 }
@@ -35,7 +36,7 @@ void AnalyzeCommand::Run() {
 }
 
 void AnalyzeCommand::Analyze(Opening opening, ProgressLine& progress) const {
-  const std::unique_ptr<SteadyClip> taken = TakeUp(input_, project_, controls_, opening);
+  const std::unique_ptr<SteadyClip> taken = TakeUp(input_, project_, controls_, opening, stretch_);
   SteadyClip& clip = *taken;
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);

@@ -22,6 +22,7 @@ class AnalyzeCommand final : public Command {
   void Analyze(Opening opening, ProgressLine& progress) const;
 
   std::string input_, project_;
+  Stretch stretch_;
   ControlFlags controls_;
   RunFlags run_;
 };

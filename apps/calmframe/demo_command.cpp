@@ -145,7 +145,7 @@ void DemoCommand::Run() {
 
   try {
     WriteSample(shaky, frames_, flags.encode, run_.threads, progress);
-    Stabilize(shaky, steady, "", controls_, flags, run_.threads, progress);
+    Stabilize(shaky, steady, "", {}, controls_, flags, run_.threads, progress);
     WriteSideBySide(shaky, steady, both, flags.encode, progress);
   } catch (...) {
     if (made) std::filesystem::remove(directory_, error);  // where nothing is in it

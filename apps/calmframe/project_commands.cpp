@@ -1,7 +1,6 @@
 #include "apps/calmframe/project_commands.h"
 
 #include <cstdio>
-#include <limits>
 #include <memory>
 #include <nlohmann/json.hpp>
 
@@ -16,29 +15,12 @@
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
-namespace {
-
-// The clip as a writer of a part sees it: its other streams belong to the whole.
-media::ClipInfo PartOf(const media::ClipInfo& info, const FrameRange& range) {
-  media::ClipInfo part = info;
-  part.frame_count = range.end - range.first;
-  if (part.frame_count == info.frame_count) return part;
-  part.path.clear();
-  if (!info.times.empty()) {
-    part.times.assign(info.times.begin() + static_cast<std::ptrdiff_t>(range.first),
-                      info.times.begin() + static_cast<std::ptrdiff_t>(range.end));
-  }
-  return part;
-}
-
-}  // namespace
-
 RenderCommand::RenderCommand(CLI::App& program)
     : Command(AddCommand(
           program, "render",
           "Draw saved work, or a part of it\n\n"
-          "With --from and --to a part, to look at before the whole is drawn; such a part is "
-          "without sound.",
+          "With --from and --to a part, with its sound, to look at before the whole is drawn. They "
+          "count in the clip, as for stabilize; but a whole number alone is a frame.",
           "Examples:\n"
           "  calmframe render --project shaky.calm steady.mp4\n"
           "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20")) {
@@ -46,13 +28,7 @@ RenderCommand::RenderCommand(CLI::App& program)
           "The steady clip to write; - for a pipe: raw frames, or Matroska with --codec; "
           "f%04d.png or a folder with / for pictures");
   AddFile(parser_, "--project", project_, "The saved work");
-  constexpr int kMost = std::numeric_limits<int>::max();
-  AddNumber<int>(
-      parser_, "--from", [this](int frame) { from_ = static_cast<std::size_t>(frame); }, "FRAME", 0,
-      kMost, "First frame, counted from 0");
-  AddNumber<int>(
-      parser_, "--to", [this](int frame) { to_ = static_cast<std::size_t>(frame); }, "FRAME", 0,
-      kMost, "Frame behind the last; the clip's end at first");
+  AddStretchFlags(parser_, stretch_, BareNumber::frame);
   AddOutputFlags(parser_, flags_);
   AddRunFlags(parser_, run_);
 }
@@ -60,22 +36,34 @@ RenderCommand::RenderCommand(CLI::App& program)
 void RenderCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
+  CheckOrder(stretch_);
   const std::unique_ptr<SteadyClip> clip = OpenSaved(project_);
-  const media::ClipInfo& info = clip->info();
-  const FrameRange range{from_, to_ == 0 ? info.frame_count : to_};
-  if (range.first >= range.end || range.end > info.frame_count) {
-    throw UsageFailure("--from must be below --to, and both within the clip's " +
-                       std::to_string(info.frame_count) + " frames");
-  }
+  const media::FrameRange range = RangeOf(*clip);
+  // As the clip's own frames; the rest counts from the first that was worked.
+  const media::FrameRange part{range.first - clip->range().first, range.end - clip->range().first};
   KeepApart(output_, {project_, clip->path()});
-  const std::unique_ptr<media::ClipWriter> writer = media::ClipWriter::Create(
-      output_, PartOf(info, range), info.width, info.height, flags_.encode);
+  const media::ClipInfo written = media::PartOf(clip->whole(), range);
+  const std::unique_ptr<media::ClipWriter> writer =
+      media::ClipWriter::Create(output_, written, written.width, written.height, flags_.encode);
   TellLosses(*writer, progress);
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   Frame(*clip, flags_.window, progress);
-  RenderClip(*clip, range, SettingsOf(flags_, run_.threads), *writer, progress);
+  RenderClip(*clip, part, SettingsOf(flags_, run_.threads), *writer, progress);
   TellOutcome(*clip, progress);
   unsaved.Throw();
+}
+
+media::FrameRange RenderCommand::RangeOf(const SteadyClip& clip) const {
+  if (!stretch_.is_given()) return clip.range();
+  media::FrameRange range = FramesOf(stretch_, clip.whole());
+  const media::FrameRange& worked = clip.range();
+  if (!stretch_.from) range.first = worked.first;
+  if (!stretch_.to) range.end = worked.end;
+  if (range.first >= range.end || !worked.Holds(range)) {
+    throw UsageFailure(project_ + ": " + WorkedText(clip) +
+                       ", and --from and --to must lie within");
+  }
+  return range;
 }
 
 InfoCommand::InfoCommand(CLI::App& program)

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <cstddef>
 #include <string>
 #include <vector>
 
@@ -18,8 +17,11 @@ class RenderCommand final : public Command {
   void Run() override;
 
  private:
+  // Of the clip's frames. Throws UsageFailure where not all of them were worked.
+  media::FrameRange RangeOf(const SteadyClip& clip) const;
+
   std::string project_, output_;
-  std::size_t from_ = 0, to_ = 0;  // to_ 0: to the end
+  Stretch stretch_;
   OutputFlags flags_;
   RunFlags run_;
 };

@@ -37,10 +37,12 @@ void AddProjectFlag(CLI::App& command, std::string& project) {
 }
 
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                   const ControlFlags& controls, Opening opening) {
+                                   const ControlFlags& controls, Opening opening,
+                                   const Stretch& stretch) {
+  CheckOrder(stretch);
   std::error_code error;
   if (project.empty() || !std::filesystem::exists(project, error)) {
-    return std::make_unique<SteadyClip>(clip, controls, opening);
+    return std::make_unique<SteadyClip>(clip, controls, opening, stretch);
   }
   host::Project saved = host::LoadProject(project);
   if (host::ContentOf(clip) != saved.clip_content) {
@@ -48,7 +50,20 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
                          project + ": is of another clip, " + saved.clip_path);
   }
   KeepPlace(project, clip, saved);
-  return std::make_unique<SteadyClip>(saved, clip, controls);
+  auto taken = std::make_unique<SteadyClip>(saved, clip, controls);
+  if (stretch.is_given() && FramesOf(stretch, taken->whole()) != taken->range()) {
+    throw UsageFailure(project + ": " + WorkedText(*taken) +
+                       "; another stretch takes a project of its own, and a part of this one is "
+                       "drawn by calmframe render");
+  }
+  return taken;
+}
+
+std::string WorkedText(const SteadyClip& clip) {
+  const media::FrameRange& worked = clip.range();
+  return "holds work from " + TimeText(clip.whole(), worked.first) + " to " +
+         TimeText(clip.whole(), worked.end) + " of the clip, frames " +
+         std::to_string(worked.first) + " to " + std::to_string(worked.end);
 }
 
 std::string FindMovedClip(const std::string& path, host::Project& project) {

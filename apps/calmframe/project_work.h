@@ -14,11 +14,13 @@ namespace calmframe {
 
 void AddProjectFlag(CLI::App& command, std::string& project);
 
-// The clip, with the work that the project keeps of it if there is such a file; such a clip may not
-// be read in order, so nothing is taken for promised. Throws media::Failure when the work is of
-// another clip.
+// The clip or the stretch of it, with the work that the project keeps of it if there is such a
+// file; such a clip may not be read in order, so nothing is taken for promised. Throws
+// media::Failure when the work is of another clip, UsageFailure when it is of another stretch; one
+// that is not given is that of the work.
 std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                   const ControlFlags& controls, Opening opening);
+                                   const ControlFlags& controls, Opening opening,
+                                   const Stretch& stretch);
 
 // Calls run(opening): by what the clip's container promises, which spares decoding it once more
 // than its analysis does, and where the frames break that from the start once more.
@@ -30,6 +32,9 @@ void RunOnPromises(const Run& run) {
   }
   run(Opening::decoded);
 }
+
+// "holds work from 0:10 to 0:25 of the clip, frames 300 to 750", the end left out.
+std::string WorkedText(const SteadyClip& clip);
 
 // Where the clip of saved work lies, which the work's file knows from now on. Throws as
 // host::FindClip.

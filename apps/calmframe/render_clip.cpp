@@ -63,7 +63,7 @@ DrawnFrame RenderFrame(host::Renderer& renderer, std::int64_t frame, const Rende
 // the effect.
 class RenderAhead {
  public:
-  RenderAhead(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings)
+  RenderAhead(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings)
       : clip_(clip),
         settings_(settings),
         end_(static_cast<std::int64_t>(range.end)),
@@ -195,7 +195,7 @@ std::vector<std::string> BannerLines(const std::map<std::string, std::size_t>& b
 }  // namespace
 
 std::vector<std::string> RenderFrames(
-    SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+    SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
     const std::string& stage, ProgressLine& progress,
     const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
     const std::function<void()>& finish) {
@@ -240,7 +240,7 @@ void TellLosses(const media::ClipWriter& writer, ProgressLine& progress) {
   for (const std::string& line : writer.warnings()) progress.Warn(line);
 }
 
-void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
                 media::ClipWriter& writer, ProgressLine& progress) {
   const std::vector<std::string> said = RenderFrames(
       clip, range, settings, "rendering", progress,

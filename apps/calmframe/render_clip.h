@@ -12,11 +12,6 @@
 
 namespace calmframe {
 
-// Frames of a clip, the end excluded.
-struct FrameRange {
-  std::size_t first = 0, end = 0;
-};
-
 // depth: 8, 16 or 32 (float) bits of a component, 0 what the source and its framing need.
 // downsample: a side is drawn with one pixel in so many. threads: frames in work at once, 0 as many
 // as there are processors. warning_banner: over frames that could not be steadied as asked, the
@@ -29,11 +24,11 @@ struct RenderSettings {
 };
 
 // Renders a solved clip's frames, several at a time, and gives them out in order, with their number
-// in the clip. `stage`: what the progress is called; it has not ended before finish(), if there is
+// in it. `stage`: what the progress is called; it has not ended before finish(), if there is
 // such, has. Gives one line for each thing that banners say, drawn or not. Throws Interrupted,
 // SolveFailure, media::Failure, and what `take` and `finish` throw.
 std::vector<std::string> RenderFrames(
-    SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+    SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
     const std::string& stage, ProgressLine& progress,
     const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
     const std::function<void()>& finish = {});
@@ -43,7 +38,7 @@ void TellLosses(const media::ClipWriter& writer, ProgressLine& progress);
 
 // The same into a file, which is then whole: frames are counted from the range's first. What
 // banners say, and the writer's warnings, are told.
-void RenderClip(SteadyClip& clip, const FrameRange& range, const RenderSettings& settings,
+void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
                 media::ClipWriter& writer, ProgressLine& progress);
 
 }  // namespace calmframe

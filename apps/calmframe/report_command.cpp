@@ -139,8 +139,8 @@ std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
   // From the source that has drawn the frames: another reader would search the file for them again.
   const host::SourcePtr source = clip.effect().shared()->layer()->state()->source;
   for (report::FilmFrame& moment : film) {
-    const host::PicturePtr shot =
-        source->Fetch(static_cast<std::int64_t>(moment.frame), host::PixelKind::argb8);
+    const host::PicturePtr shot = source->Fetch(
+        static_cast<std::int64_t>(clip.range().first + moment.frame), host::PixelKind::argb8);
     if (!shot) continue;
     moment.before = report::DataUrlOf(
         {shot->row<HX_Pixel8>(0), shot->row_bytes(), shot->width(), shot->height(), aspect},
@@ -203,7 +203,8 @@ void ReportCommand::Run() {
                    (info.field_order == media::FieldOrder::progressive ? "" : ", interlaced")},
       {"Length", std::to_string(info.frame_count) +
                      (info.frame_count == 1 ? " frame, " : " frames, ") +
-                     report::Short(static_cast<double>(info.frame_count) / rate, 2) + " s"}};
+                     report::Short(static_cast<double>(info.frame_count) / rate, 2) + " s" +
+                     (info.cut ? ", from " + TimeText(clip->whole(), clip->range().first) : "")}};
   const auto note = [&](const std::string& line) {
     if (line.empty()) return;
     progress.Warn(line);

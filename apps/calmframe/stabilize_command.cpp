@@ -174,11 +174,11 @@ RenderSettings SettingsOf(const OutputFlags& flags, int threads) {
 }
 
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
-               const ControlFlags& controls, const OutputFlags& flags, int threads,
-               ProgressLine& progress) {
+               const Stretch& stretch, const ControlFlags& controls, const OutputFlags& flags,
+               int threads, ProgressLine& progress) {
   const tessel::threads::ProcessorLimit limit(threads);
   RunOnPromises([&](Opening opening) {
-    const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls, opening);
+    const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls, opening, stretch);
     const media::ClipInfo& info = clip->info();
     if (!info.warning.empty()) progress.Warn(info.warning);
     KeepApart(output, {project});
@@ -207,13 +207,15 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
           "Examples:\n"
           "  calmframe stabilize shaky.mp4 steady.mp4\n"
           "  calmframe stabilize walk.mp4 calm.mp4 --smoothness 100\n"
-          "  calmframe stabilize talk.mp4 still.mp4 --result no-motion")) {
+          "  calmframe stabilize talk.mp4 still.mp4 --result no-motion\n"
+          "  calmframe stabilize hike.mp4 summit.mp4 --from 0:02 --to 0:12")) {
   AddFile(parser_, "IN", input_,
           "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
   AddFile(parser_, "OUT", output_,
           "The steady clip to write; - for a pipe: raw frames, or Matroska with --codec; "
           "f%04d.png or a folder with / for pictures");
   AddControlFlags(parser_, controls_);
+  AddStretchFlags(parser_, stretch_, BareNumber::seconds);
   AddOutputFlags(parser_, flags_);
   AddProjectFlag(parser_, project_);
   AddRunFlags(parser_, run_);
@@ -221,7 +223,7 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
 
 void StabilizeCommand::Run() {
   ProgressLine progress(run_.progress_form());
-  Stabilize(input_, output_, project_, controls_, flags_, run_.threads, progress);
+  Stabilize(input_, output_, project_, stretch_, controls_, flags_, run_.threads, progress);
 }
 
 }  // namespace calmframe

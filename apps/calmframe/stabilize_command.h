@@ -8,6 +8,7 @@
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/steady_clip.h"
+#include "apps/calmframe/stretch.h"
 #include "host/media/clip.h"
 
 namespace calmframe {
@@ -43,11 +44,12 @@ struct OutputFlags {
 void AddOutputFlags(CLI::App& command, OutputFlags& flags);
 RenderSettings SettingsOf(const OutputFlags& flags, int threads);
 
-// From a file to a file. `project`: where saved work is taken up, if it is there, and left; empty
-// for none. Throws media::Failure, UsageFailure, SolveFailure, host::ProjectFailure, Interrupted.
+// From a file to a file; of a stretch only its frames are worked and written. `project`: where
+// saved work is taken up, if it is there, and left; empty for none. Throws media::Failure,
+// UsageFailure, SolveFailure, host::ProjectFailure, Interrupted.
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
-               const ControlFlags& controls, const OutputFlags& flags, int threads,
-               ProgressLine& progress);
+               const Stretch& stretch, const ControlFlags& controls, const OutputFlags& flags,
+               int threads, ProgressLine& progress);
 
 // What a user should know of the crop: that much is lost, or all. No line where all is well.
 struct CropTrouble {
@@ -76,6 +78,7 @@ class StabilizeCommand final : public Command {
 
  private:
   std::string input_, output_, project_;
+  Stretch stretch_;
   ControlFlags controls_;
   OutputFlags flags_;
   RunFlags run_;

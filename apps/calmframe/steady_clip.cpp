@@ -74,6 +74,20 @@ std::string FailureText(int status, const std::vector<std::string>& messages) {
   }
 }
 
+media::ClipReader::Part PartFor(const Stretch& stretch) {
+  if (!stretch.is_given()) return {};
+  return [stretch](const media::ClipInfo& clip) { return FramesOf(stretch, clip); };
+}
+
+// A layer may reach beyond its clip.
+media::FrameRange RangeOf(const host::Project& project, const media::ClipInfo& clip) {
+  const auto count = static_cast<std::int64_t>(clip.frame_count);
+  const std::int64_t first = std::clamp<std::int64_t>(project.start_frame, 0, count - 1);
+  const std::int64_t end = std::clamp<std::int64_t>(
+      std::int64_t{project.start_frame} + project.length, first + 1, count);
+  return {static_cast<std::size_t>(first), static_cast<std::size_t>(end)};
+}
+
 }  // namespace
 
 std::string Reuse::Text() const {
@@ -119,23 +133,33 @@ SteadyClip::Medium SteadyClip::Blank(const host::Project& project) {
   return {info, host::MakeDrawnSource(source, draw), nullptr};
 }
 
-SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls, Opening opening)
-    : SteadyClip(nullptr,
-                 Open(path, opening == Opening::promised ? media::ClipReader::OpenPromised(path)
-                                                         : media::ClipReader::Open(path)),
-                 controls) {}
+SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls, Opening opening,
+                       const Stretch& stretch)
+    : SteadyClip(Open(path, opening == Opening::promised
+                                ? media::ClipReader::OpenPromised(path, PartFor(stretch))
+                                : media::ClipReader::Open(path)),
+                 controls, stretch) {}
+
+SteadyClip::SteadyClip(const Medium& medium, const ControlFlags& controls, const Stretch& stretch)
+    : SteadyClip(nullptr, medium, FramesOf(stretch, medium.info), controls) {}
+
+SteadyClip::SteadyClip(const host::Project& project, const Medium& medium,
+                       const ControlFlags& controls)
+    : SteadyClip(&project, medium, RangeOf(project, medium.info), controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const std::string& path,
                        const ControlFlags& controls)
-    : SteadyClip(&project, Open(path, media::ClipReader::Open(path, project.clip_frames)),
+    : SteadyClip(project, Open(path, media::ClipReader::Open(path, project.clip_frames)),
                  controls) {}
 
 SteadyClip::SteadyClip(const host::Project& project, const ControlFlags& controls)
-    : SteadyClip(&project, Blank(project), controls) {}
+    : SteadyClip(project, Blank(project), controls) {}
 
 SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
-                       const ControlFlags& controls) try
-    : info_(medium.info),
+                       const media::FrameRange& range, const ControlFlags& controls) try
+    : whole_(medium.info),
+      range_(range),
+      info_(media::PartOf(whole_, range_)),
       found_(medium.found),
       host_(PluginPath(), SettingsFor(info_)),
       values_(ResolveControls(controls, host_.declarations())),
@@ -143,9 +167,9 @@ SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
   const auto layer = boost::make_shared<host::Layer>(medium.source);
   layer->Change([&](host::LayerState& state) {
     state.name = state.file_name = path();
+    state.start_frame = project ? project->start_frame : static_cast<std::int32_t>(range_.first);
+    state.length = project ? project->length : static_cast<std::int32_t>(range_.size());
     if (!project) return;
-    state.start_frame = project->start_frame;
-    state.length = project->length;
     state.ticks_per_frame = project->ticks_per_frame;
     state.field_type = project->field_type;
   });

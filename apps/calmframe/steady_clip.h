@@ -8,6 +8,7 @@
 
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
+#include "apps/calmframe/stretch.h"
 #include "host/effects/host.h"
 #include "host/effects/session.h"
 #include "host/media/clip.h"
@@ -37,16 +38,21 @@ enum class Opening { decoded, promised };
 // A clip on the timeline of a host, with the effect applied to it. For the thread that made it.
 class SteadyClip {
  public:
-  // A clip of which nothing is done yet, or the saved work of one, its controls changed where flags
-  // say so. Throws media::Failure, UsageFailure, and SolveFailure when the effect can't be had.
+  // A clip of which nothing is done yet, or a stretch of one; or the saved work of one, with its
+  // own stretch, its controls changed where flags say so. Throws media::Failure, UsageFailure, and
+  // SolveFailure when the effect can't be had.
   SteadyClip(const std::string& path, const ControlFlags& controls,
-             Opening opening = Opening::decoded);
+             Opening opening = Opening::decoded, const Stretch& stretch = {});
   SteadyClip(const host::Project& project, const std::string& path, const ControlFlags& controls);
   // The saved work of a clip that is gone: what was made of it stands, its frames are blank.
   SteadyClip(const host::Project& project, const ControlFlags& controls);
 
   const std::string& path() const { return info_.path; }
+  // As a clip of its own: a part, where only a stretch of it is worked.
   const media::ClipInfo& info() const { return info_; }
+  const media::ClipInfo& whole() const { return whole_; }
+  // What is worked, in frames of the whole clip.
+  const media::FrameRange& range() const { return range_; }
   host::Host& host() { return host_; }
   bool has_new_controls() const { return !values_.empty(); }
   host::Effect& effect() { return *effect_; }
@@ -94,7 +100,10 @@ class SteadyClip {
   };
   static Medium Open(const std::string& path, std::unique_ptr<media::ClipReader> reader);
   static Medium Blank(const host::Project& project);
-  SteadyClip(const host::Project* project, const Medium& medium, const ControlFlags& controls);
+  SteadyClip(const Medium& medium, const ControlFlags& controls, const Stretch& stretch);
+  SteadyClip(const host::Project& project, const Medium& medium, const ControlFlags& controls);
+  SteadyClip(const host::Project* project, const Medium& medium, const media::FrameRange& range,
+             const ControlFlags& controls);
   bool IsBroken() const;
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`. `shown`: the
   // stage that was shown last and goes on until another one begins or End ends it.
@@ -115,6 +124,8 @@ class SteadyClip {
   // Address of the first frame's warp, which goes with its solve; null without one.
   const void* FirstWarp();
 
+  const media::ClipInfo whole_;
+  const media::FrameRange range_;
   const media::ClipInfo info_;
   const std::shared_ptr<const media::FoundFrames> found_;  // null of a stand-in
   host::Host host_;
