@@ -39,18 +39,19 @@ bool Dot(std::string_view word, int column, int row) {
 
 }  // namespace
 
-void DrawCaption(std::string_view word, HX_Pixel8* pixels, std::size_t row_pixels, int width,
-                 int height) {
-  const int dot = std::max(1, height / (20 * (kRows + 4)));
+std::unique_ptr<host::WorldBuffer> Caption(std::string_view word, int picture_height) {
+  const int dot = std::max(1, picture_height / (20 * (kRows + 4)));
   const int columns = kColumns * static_cast<int>(word.size()) + 3;  // with a margin of two dots
   const int rows = kRows + 4;
-  for (int y = 0; y < std::min(height, rows * dot); ++y) {
-    HX_Pixel8* row = pixels + static_cast<std::size_t>(y) * row_pixels;
-    for (int x = 0; x < std::min(width, columns * dot); ++x) {
+  auto caption = std::make_unique<host::WorldBuffer>(columns * dot, rows * dot, HX_FORMAT_ARGB8);
+  for (int y = 0; y < rows * dot; ++y) {
+    HX_Pixel8* row = caption->row<HX_Pixel8>(y);
+    for (int x = 0; x < columns * dot; ++x) {
       const std::uint8_t level = Dot(word, x / dot - 2, y / dot - 2) ? 255 : 0;
       row[x] = {255, level, level, level};
     }
   }
+  return caption;
 }
 
 }  // namespace calmframe

@@ -1,15 +1,14 @@
 #pragma once
 
-#include <cstddef>
+#include <memory>
 #include <string_view>
 
-#include "platform/hx/hx_pixel.h"
+#include "host/pixels/world_buffer.h"
 
 namespace calmframe {
 
-// Writes a word in white on black at the top left of a picture of `width` x `height` pixels, a
-// twentieth of its height tall; what does not fit is left out. Letters: A D E H K S T Y.
-void DrawCaption(std::string_view word, HX_Pixel8* pixels, std::size_t row_pixels, int width,
-                 int height);
+// A word in white on black, a twentieth as tall as the picture that it is for, in ARGB of 8 bits.
+// Letters: A D E H K S T Y.
+std::unique_ptr<host::WorldBuffer> Caption(std::string_view word, int picture_height);
 
 }  // namespace calmframe

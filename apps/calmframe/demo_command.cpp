@@ -6,7 +6,6 @@
 #include <memory>
 #include <vector>
 
-#include "apps/calmframe/caption.h"
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "host/media/clip.h"
@@ -18,13 +17,6 @@ namespace {
 
 constexpr int kWidth = 1280;
 constexpr int kHeight = 720;
-constexpr int kSeam = 8;  // pixels of black where the pictures of a side-by-side meet
-
-media::EncodeSettings Encoding(const media::EncodeSettings& wanted) {
-  media::EncodeSettings settings = wanted;
-  settings.overwrite = true;  // the directory is the demo's own
-  return settings;
-}
 
 void End(Progress shown, ProgressLine& progress) {
   shown.done = shown.total;
@@ -74,37 +66,6 @@ void WriteSample(const std::string& path, int frames, const media::EncodeSetting
   End(shown, progress);
 }
 
-void WriteSideBySide(const std::string& left_path, const std::string& right_path,
-                     const std::string& path, const media::EncodeSettings& encode,
-                     ProgressLine& progress) {
-  const auto left = media::ClipReader::Open(left_path);
-  const auto right = media::ClipReader::Open(right_path);
-  media::ClipInfo info = left->info();
-  const int width = info.width;
-  const auto writer = media::ClipWriter::Create(path, info, 2 * width, info.height, encode);
-  const std::ptrdiff_t row_bytes = 2 * width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8));
-  const std::size_t row_pixels = 2 * static_cast<std::size_t>(width);
-  std::vector<HX_Pixel8> pixels(row_pixels * static_cast<std::size_t>(info.height));
-  HX_Pixel8* left_half = pixels.data();
-  HX_Pixel8* right_half = left_half + width;
-  Progress shown{"pairing", 0, static_cast<double>(info.frame_count), "frames", "", false};
-  for (std::size_t f = 0; f < info.frame_count; ++f) {
-    if (InterruptAsked()) throw Interrupted();
-    shown.done = static_cast<double>(f);
-    progress.Show(shown);
-    left->Read(f, left_half, row_bytes);
-    right->Read(f, right_half, row_bytes);
-    DrawCaption("SHAKY", left_half, row_pixels, width, info.height);
-    DrawCaption("STEADY", right_half, row_pixels, width, info.height);
-    for (std::size_t y = 0; y < static_cast<std::size_t>(info.height); ++y) {
-      std::fill_n(right_half + y * row_pixels - kSeam / 2, kSeam, HX_Pixel8{255, 0, 0, 0});
-    }
-    writer->Write(f, pixels.data(), row_bytes);
-  }
-  writer->Finish();
-  End(shown, progress);
-}
-
 }  // namespace
 
 DemoCommand::DemoCommand(CLI::App& program)
@@ -141,12 +102,13 @@ void DemoCommand::Run() {
   const std::vector<std::string> files = Kept();
   const std::string &shaky = files[0], &steady = files[1], &both = files[2];
   OutputFlags flags = flags_;
-  flags.encode = Encoding(flags_.encode);
+  flags.encode.overwrite = true;  // the directory is the demo's own
+  flags.side_by_side = both;
+  flags.labels_sides = true;
 
   try {
     WriteSample(shaky, frames_, flags.encode, run_.threads, progress);
     Stabilize(shaky, steady, "", {}, controls_, flags, run_.threads, progress);
-    WriteSideBySide(shaky, steady, both, flags.encode, progress);
   } catch (...) {
     if (made) std::filesystem::remove(directory_, error);  // where nothing is in it
     throw;

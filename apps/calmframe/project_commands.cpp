@@ -30,6 +30,7 @@ RenderCommand::RenderCommand(CLI::App& program)
   AddFile(parser_, "--project", project_, "The saved work");
   AddStretchFlags(parser_, stretch_, BareNumber::frame);
   AddOutputFlags(parser_, flags_);
+  AddSideBySideFlag(parser_, flags_);
   AddRunFlags(parser_, run_);
 }
 
@@ -45,12 +46,15 @@ void RenderCommand::Run() {
   const media::ClipInfo written = media::PartOf(clip->whole(), range);
   const std::unique_ptr<media::ClipWriter> writer =
       media::ClipWriter::Create(output_, written, written.width, written.height, flags_.encode);
-  TellLosses(*writer, progress);
+  const std::unique_ptr<SideBySide> both =
+      MakeSideBySide(flags_, written, output_, {project_, clip->path()});
+  TellLosses(*writer, both.get(), progress);
   const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   Frame(*clip, flags_.window, progress);
-  RenderClip(*clip, part, SettingsOf(flags_, run_.threads), *writer, progress);
+  RenderClip(*clip, part, SettingsOf(flags_, run_.threads), *writer, both.get(), progress);
   TellOutcome(*clip, progress);
   unsaved.Throw();
+  if (both) both->Throw();
 }
 
 media::FrameRange RenderCommand::RangeOf(const SteadyClip& clip) const {

@@ -24,6 +24,12 @@ void KeepPlace(const std::string& path, const std::string& clip, host::Project& 
   }
 }
 
+// Links followed, also of a name in the present folder of which nothing is there yet.
+std::filesystem::path PlaceOf(const std::string& path, std::error_code& error) {
+  const std::filesystem::path whole = std::filesystem::absolute(path, error);
+  return error ? whole : std::filesystem::weakly_canonical(whole, error);
+}
+
 }  // namespace
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
@@ -78,18 +84,18 @@ std::unique_ptr<SteadyClip> OpenSaved(const std::string& path, const ControlFlag
   return std::make_unique<SteadyClip>(project, clip, controls);
 }
 
-void KeepApart(const std::string& output, const std::vector<std::string>& inputs) {
+void KeepApart(const std::string& output, const std::vector<std::string>& inputs,
+               const std::string& what) {
   for (const std::string& input : inputs) {
     if (input.empty()) continue;
     std::error_code unknown, input_unknown;
     bool same = std::filesystem::equivalent(output, input, unknown);
     if (!same) {  // one that is not there yet, such as a project to be made
-      const auto place = std::filesystem::weakly_canonical(output, unknown);
-      same = place == std::filesystem::weakly_canonical(input, input_unknown) && !unknown &&
-             !input_unknown;
+      same =
+          PlaceOf(output, unknown) == PlaceOf(input, input_unknown) && !unknown && !input_unknown;
     }
     if (same) {
-      throw media::Failure(media::Failure::Side::output, output + ": is an input itself");
+      throw media::Failure(media::Failure::Side::output, output + ": is " + what + " itself");
     }
   }
 }

@@ -46,8 +46,10 @@ std::unique_ptr<SteadyClip> OpenSaved(const std::string& project,
                                       const ControlFlags& controls = {});
 
 // Nothing of the user's is written over by a result of it: throws media::Failure (output) where
-// `output` is one of `inputs` under any name. Empty names stand for no file.
-void KeepApart(const std::string& output, const std::vector<std::string>& inputs);
+// `output` is one of `inputs` under any name. Empty names stand for no file. `what` one of them is,
+// in the message.
+void KeepApart(const std::string& output, const std::vector<std::string>& inputs,
+               const std::string& what = "an input");
 
 // A save that failed: the work is done all the same, and whoever asked for it gets its result
 // first.

@@ -15,16 +15,11 @@
 
 #include "apps/calmframe/failures.h"
 #include "host/effects/renderer.h"
+#include "host/timeline/layer.h"
 #include "platform/hx/hx_controls.h"
 
 namespace calmframe {
 namespace {
-
-// A frame as it is to be written.
-struct DrawnFrame {
-  std::shared_ptr<host::WorldBuffer> pixels;
-  std::string banner;  // what the effect's banner over it says; empty: it has none
-};
 
 // The lines of one parity (0: lines 0, 2, 4 ...).
 void CopyField(const host::WorldBuffer& from, int parity, host::WorldBuffer& to) {
@@ -49,7 +44,7 @@ DrawnFrame RenderFrame(host::Renderer& renderer, std::int64_t frame, const Rende
     if (!rendered.result.ok()) {
       throw SolveFailure(rendered.result.Line("frame " + std::to_string(frame)));
     }
-    return DrawnFrame{rendered.OnLayer(), rendered.banner};
+    return DrawnFrame{rendered.OnLayer(), nullptr, rendered.banner};
   };
   DrawnFrame first = render(false);
   if (order == media::FieldOrder::progressive) return first;
@@ -113,7 +108,10 @@ class RenderAhead {
         if (stopped_ || failure_ || next_ >= end_) return;
         const std::int64_t frame = next_++;
         lock.unlock();
+        // First, since the render asks for the same one.
+        const host::PicturePtr shot = settings_.shots ? Shot(frame) : nullptr;
         DrawnFrame drawn = RenderFrame(*renderer, frame, settings_, clip_.info().field_order);
+        drawn.shot = shot;
         lock.lock();
         done_[frame] = std::move(drawn);
         changed_.notify_all();
@@ -123,6 +121,15 @@ class RenderAhead {
       if (!failure_) failure_ = std::current_exception();
       changed_.notify_all();
     }
+  }
+
+  host::PicturePtr Shot(std::int64_t frame) const {
+    const boost::shared_ptr<const host::LayerState> layer =
+        clip_.effect().shared()->layer()->state();
+    host::PicturePtr shot = layer->source->Fetch(std::int64_t{layer->start_frame} + frame,
+                                                 host::KindOfDepth(settings_.depth));
+    if (!shot) throw SolveFailure("frame " + std::to_string(frame) + ": the clip has none such");
+    return shot;
   }
 
   SteadyClip& clip_;
@@ -137,18 +144,6 @@ class RenderAhead {
   bool stopped_ = false;
   std::vector<std::thread> threads_;
 };
-
-void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer& pixels) {
-  const std::ptrdiff_t row_bytes = pixels.world().row_bytes;
-  switch (pixels.world().format) {
-    case HX_FORMAT_ARGB8:
-      return writer.Write(frame, pixels.row<HX_Pixel8>(0), row_bytes);
-    case HX_FORMAT_ARGB16:
-      return writer.Write(frame, pixels.row<HX_Pixel16>(0), row_bytes);
-    default:
-      return writer.Write(frame, pixels.row<HX_PixelFloat>(0), row_bytes);
-  }
-}
 
 bool SynthesizesEdges(const SteadyClip& clip) {
   return clip.ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
@@ -197,7 +192,7 @@ std::vector<std::string> BannerLines(const std::map<std::string, std::size_t>& b
 std::vector<std::string> RenderFrames(
     SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
     const std::string& stage, ProgressLine& progress,
-    const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
+    const std::function<void(std::size_t, const DrawnFrame&)>& take,
     const std::function<void()>& finish) {
   RenderSettings own = settings;
   if (own.depth == 0) own.depth = DepthFor(clip);
@@ -220,7 +215,7 @@ std::vector<std::string> RenderFrames(
     progress.Show(shown);
     const DrawnFrame made = frames.Take(static_cast<std::int64_t>(frame));
     if (!made.banner.empty()) ++banners[made.banner];
-    take(frame, *made.pixels);
+    take(frame, made);
   }
   clip.CheckMedia();
   if (finish) {
@@ -236,20 +231,40 @@ std::vector<std::string> RenderFrames(
   return BannerLines(banners, range.end - range.first);
 }
 
-void TellLosses(const media::ClipWriter& writer, ProgressLine& progress) {
+void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer& pixels) {
+  const std::ptrdiff_t row_bytes = pixels.world().row_bytes;
+  switch (pixels.world().format) {
+    case HX_FORMAT_ARGB8:
+      return writer.Write(frame, pixels.row<HX_Pixel8>(0), row_bytes);
+    case HX_FORMAT_ARGB16:
+      return writer.Write(frame, pixels.row<HX_Pixel16>(0), row_bytes);
+    default:
+      return writer.Write(frame, pixels.row<HX_PixelFloat>(0), row_bytes);
+  }
+}
+
+void TellLosses(const media::ClipWriter& writer, const SideBySide* both, ProgressLine& progress) {
   for (const std::string& line : writer.warnings()) progress.Warn(line);
+  if (!both) return;
+  for (const std::string& line : both->warnings()) progress.Warn(line);
 }
 
 void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
-                media::ClipWriter& writer, ProgressLine& progress) {
+                media::ClipWriter& writer, SideBySide* both, ProgressLine& progress) {
+  RenderSettings own = settings;
+  own.shots = both != nullptr;
   const std::vector<std::string> said = RenderFrames(
-      clip, range, settings, "rendering", progress,
-      [&](std::size_t frame, const host::WorldBuffer& pixels) {
-        Write(writer, frame - range.first, pixels);
+      clip, range, own, "rendering", progress,
+      [&](std::size_t frame, const DrawnFrame& drawn) {
+        Write(writer, frame - range.first, *drawn.pixels);
+        if (both) both->Write(frame - range.first, *drawn.shot, *drawn.pixels);
       },
-      [&writer] { writer.Finish(); });
+      [&] {
+        writer.Finish();
+        if (both) both->Finish();
+      });
   for (const std::string& line : said) progress.Warn(line);
-  TellLosses(writer, progress);
+  TellLosses(writer, both, progress);
 }
 
 }  // namespace calmframe

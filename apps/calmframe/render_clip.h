@@ -2,25 +2,36 @@
 
 #include <cstddef>
 #include <functional>
+#include <memory>
 #include <string>
 #include <vector>
 
 #include "apps/calmframe/progress_line.h"
+#include "apps/calmframe/side_by_side.h"
 #include "apps/calmframe/steady_clip.h"
 #include "host/media/clip.h"
 #include "host/pixels/world_buffer.h"
+#include "host/timeline/picture.h"
 
 namespace calmframe {
+
+// A frame as it is to be written.
+struct DrawnFrame {
+  std::shared_ptr<host::WorldBuffer> pixels;
+  host::PicturePtr shot;  // as the clip has it, at the same depth; null unless it is asked for
+  std::string banner;     // what the effect's banner over it says; empty: it has none
+};
 
 // depth: 8, 16 or 32 (float) bits of a component, 0 what the source and its framing need.
 // downsample: a side is drawn with one pixel in so many. threads: frames in work at once, 0 as many
 // as there are processors. warning_banner: over frames that could not be steadied as asked, the
-// effect's banner; whatever the clip's own control says.
+// effect's banner; whatever the clip's own control says. shots: with the frames as they were shot.
 struct RenderSettings {
   int depth = 0;
   int downsample = 1;
   int threads = 0;
   bool warning_banner = false;
+  bool shots = false;
 };
 
 // Renders a solved clip's frames, several at a time, and gives them out in order, with their number
@@ -30,15 +41,19 @@ struct RenderSettings {
 std::vector<std::string> RenderFrames(
     SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
     const std::string& stage, ProgressLine& progress,
-    const std::function<void(std::size_t, const host::WorldBuffer&)>& take,
+    const std::function<void(std::size_t, const DrawnFrame&)>& take,
     const std::function<void()>& finish = {});
 
-// What the writer warns of and was not told yet, such as what its file can't keep of the clip.
-void TellLosses(const media::ClipWriter& writer, ProgressLine& progress);
+// Writes a frame of any depth.
+void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer& pixels);
 
-// The same into a file, which is then whole: frames are counted from the range's first. What
-// banners say, and the writer's warnings, are told.
+// What the writers warn of and was not told yet, such as what a file can't keep of the clip. `both`
+// may be null.
+void TellLosses(const media::ClipWriter& writer, const SideBySide* both, ProgressLine& progress);
+
+// The same into a file, which is then whole, and into one of before and after, if there is such:
+// frames are counted from the range's first. What banners say, and the writers' warnings, are told.
 void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
-                media::ClipWriter& writer, ProgressLine& progress);
+                media::ClipWriter& writer, SideBySide* both, ProgressLine& progress);
 
 }  // namespace calmframe

@@ -130,10 +130,11 @@ std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
   RenderSettings settings{.depth = 8, .threads = threads};
   settings.downsample = std::clamp(info.width / kPictureWidth, 1, kMostDownsampled);
   said = RenderFrames(clip, {0, info.frame_count}, settings, "drawing", progress,
-                      [&](std::size_t frame, const host::WorldBuffer& pixels) {
-                        empty.push_back(100 * EmptyShare(pixels));
+                      [&](std::size_t frame, const DrawnFrame& drawn) {
+                        empty.push_back(100 * EmptyShare(*drawn.pixels));
                         if (next < film.size() && frame == film[next].frame) {
-                          film[next++].after = DataUrlOf(ViewOf(pixels, aspect), kPictureWidth);
+                          film[next++].after =
+                              DataUrlOf(ViewOf(*drawn.pixels, aspect), kPictureWidth);
                         }
                       });
   // From the source that has drawn the frames: another reader would search the file for them again.

@@ -169,8 +169,25 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
   PutInGroup("Output", {crf, codec, pixel_format, depth, banner, overwrite});
 }
 
+void AddSideBySideFlag(CLI::App& command, OutputFlags& flags) {
+  PutInGroup("Output", {AddFile(command, "--side-by-side", flags.side_by_side,
+                                "Write before and after beside each other to this file too; the "
+                                "other flags of the output count for it as well",
+                                Need::optional)});
+}
+
 RenderSettings SettingsOf(const OutputFlags& flags, int threads) {
   return {.depth = flags.depth, .threads = threads, .warning_banner = flags.warning_banner};
+}
+
+std::unique_ptr<SideBySide> MakeSideBySide(const OutputFlags& flags, const media::ClipInfo& info,
+                                           const std::string& output,
+                                           const std::vector<std::string>& inputs) {
+  const std::string& path = flags.side_by_side;
+  if (path.empty()) return nullptr;
+  KeepApart(path, inputs);
+  KeepApart(path, {output}, "the other output");
+  return std::make_unique<SideBySide>(path, info, flags.encode, flags.labels_sides);
 }
 
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
@@ -185,12 +202,15 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
     // Made first, so that an output that cannot be written costs nobody an analysis.
     const std::unique_ptr<media::ClipWriter> writer =
         media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
-    TellLosses(*writer, progress);
+    const std::unique_ptr<SideBySide> both = MakeSideBySide(flags, info, output, {project});
+    TellLosses(*writer, both.get(), progress);
     const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
     Frame(*clip, flags.window, progress);
-    RenderClip(*clip, {0, info.frame_count}, SettingsOf(flags, threads), *writer, progress);
+    RenderClip(*clip, {0, info.frame_count}, SettingsOf(flags, threads), *writer, both.get(),
+               progress);
     TellOutcome(*clip, progress);
     unsaved.Throw();
+    if (both) both->Throw();
   });
 }
 
@@ -217,6 +237,7 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
   AddControlFlags(parser_, controls_);
   AddStretchFlags(parser_, stretch_, BareNumber::seconds);
   AddOutputFlags(parser_, flags_);
+  AddSideBySideFlag(parser_, flags_);
   AddProjectFlag(parser_, project_);
   AddRunFlags(parser_, run_);
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -7,6 +8,7 @@
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/render_clip.h"
+#include "apps/calmframe/side_by_side.h"
 #include "apps/calmframe/steady_clip.h"
 #include "apps/calmframe/stretch.h"
 #include "host/media/clip.h"
@@ -40,8 +42,17 @@ struct OutputFlags {
   media::EncodeSettings encode;
   int depth = 0;  // see RenderClip
   bool warning_banner = false;
+  std::string side_by_side;  // a file, of before and after; empty: none
+  bool labels_sides = false;
 };
 void AddOutputFlags(CLI::App& command, OutputFlags& flags);
+// Adds --side-by-side.
+void AddSideBySideFlag(CLI::App& command, OutputFlags& flags);
+// What that asks for, null for nothing. Throws media::Failure (output) where it can't be written,
+// or is `output` or one of `inputs`.
+std::unique_ptr<SideBySide> MakeSideBySide(const OutputFlags& flags, const media::ClipInfo& info,
+                                           const std::string& output,
+                                           const std::vector<std::string>& inputs);
 RenderSettings SettingsOf(const OutputFlags& flags, int threads);
 
 // From a file to a file; of a stretch only its frames are worked and written. `project`: where
