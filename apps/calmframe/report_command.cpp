@@ -14,6 +14,7 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
+#include "apps/calmframe/plugin_path.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/track_export.h"
@@ -55,7 +56,7 @@ double EmptyShare(const host::WorldBuffer& pixels) {
 }
 
 // Those that a person sets, and of the experts' those that were changed.
-std::vector<report::Fact> ControlsOf(SteadyClip& clip) {
+std::vector<report::Fact> ControlsOf(host::SteadyClip& clip) {
   std::vector<report::Fact> facts;
   for (const HX_ParamDef& declared : clip.host().declarations()) {
     const auto param = clip.effect().Param(clip.effect().IndexOf(declared.disk_id));
@@ -93,7 +94,7 @@ double PixelAspectOf(const media::ClipInfo& info) {
 }
 
 // `shown`: what the user calls the work.
-report::SolvedClip SolvedOf(SteadyClip& clip, const std::string& shown) {
+report::SolvedClip SolvedOf(host::SteadyClip& clip, const std::string& shown) {
   const ScratchFolder folder;
   const std::string path = folder.path() / "tracks.trk";
   const report::TrackTable tracks = SaveTracks(clip, shown, path, path);
@@ -121,7 +122,7 @@ std::vector<report::FilmFrame> Moments(const media::ClipInfo& info) {
 
 // Draws the whole clip, small: how much of each frame is left empty, percent, and the pictures of
 // the film's moments.
-std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
+std::vector<double> Draw(host::SteadyClip& clip, int threads, ProgressLine& progress,
                          std::vector<report::FilmFrame>& film) {
   const media::ClipInfo& info = clip.info();
   const double aspect = PixelAspectOf(info);
@@ -150,16 +151,16 @@ std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
 }
 
 // The clip of saved work, or where that is gone a stand-in for it, and a line that says so.
-std::unique_ptr<SteadyClip> OpenForReport(const std::string& path, std::string* gone) {
+std::unique_ptr<host::SteadyClip> OpenForReport(const std::string& path, std::string* gone) {
   host::Project project = host::LoadProject(path);
   std::string clip;
   try {
     clip = FindMovedClip(path, project);
   } catch (const host::ProjectFailure& failure) {
     *gone = failure.what();
-    return std::make_unique<SteadyClip>(project, ControlFlags());
+    return std::make_unique<host::SteadyClip>(PluginPath(), project);
   }
-  return std::make_unique<SteadyClip>(project, clip, ControlFlags());
+  return std::make_unique<host::SteadyClip>(PluginPath(), project, clip);
 }
 
 std::string NameOf(const std::string& path) {
@@ -189,7 +190,7 @@ void ReportCommand::Run() {
   ProgressLine progress(run_.progress_form());
   media::OutputFile file(output_, project_, overwrite_);
   std::string gone;
-  const std::unique_ptr<SteadyClip> clip = OpenForReport(project_, &gone);
+  const std::unique_ptr<host::SteadyClip> clip = OpenForReport(project_, &gone);
   KeepApart(output_, {clip->path()});
   const media::ClipInfo& info = clip->info();
   const double rate =

@@ -10,6 +10,7 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
+#include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
 #include "platform/tessel/threads.h"
 
@@ -21,9 +22,9 @@ constexpr std::int32_t kMaximumScale = HX_MAXIMUM_SCALE.disk_id;
 constexpr std::int32_t kAdditionalScale = HX_ADDITIONAL_SCALE.disk_id;
 
 // The share of the picture that stays black because the controls stop its enlargement, 0 to 1.
-double BlackShare(const SteadyClip& clip, double width, const CropWindow& crop) {
+double BlackShare(const host::SteadyClip& clip, double width, const host::CropWindow& crop) {
   // Whoever asks for a border or a smaller picture has one.
-  if (clip.ValueOf(HX_FRAMING.disk_id) != kCropAutoScale || clip.ValueOf(kSafeMargin) > 0 ||
+  if (clip.ValueOf(HX_FRAMING.disk_id) != host::kCropAutoScale || clip.ValueOf(kSafeMargin) > 0 ||
       clip.ValueOf(kAdditionalScale) < 100) {
     return 0;
   }
@@ -34,9 +35,9 @@ double BlackShare(const SteadyClip& clip, double width, const CropWindow& crop) 
 
 }  // namespace
 
-CropTrouble CropTroubleOf(SteadyClip& clip) {
-  if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return {};
-  const std::unique_ptr<CropWindow> crop = clip.Crop();
+CropTrouble CropTroubleOf(host::SteadyClip& clip) {
+  if (!host::Crops(clip.ValueOf(HX_FRAMING.disk_id))) return {};
+  const std::unique_ptr<host::CropWindow> crop = clip.Crop();
   if (!crop || crop->width <= 0 || crop->height <= 0) {
     return {
         "no part of the picture stays in view; set --framing stabilize-only or adjust other flags",
@@ -47,8 +48,9 @@ CropTrouble CropTroubleOf(SteadyClip& clip) {
                        static_cast<double>(info.pixel_aspect.num) /
                        static_cast<double>(info.pixel_aspect.den);
   // Without motion there is nothing to smooth.
-  const std::string gentler =
-      clip.ValueOf(HX_RESULT.disk_id) == kNoMotion ? "--result smooth-motion" : "less --smoothness";
+  const std::string gentler = clip.ValueOf(HX_RESULT.disk_id) == host::kNoMotion
+                                  ? "--result smooth-motion"
+                                  : "less --smoothness";
   const std::string window = std::to_string(crop->width) + "x" + std::to_string(crop->height);
   constexpr double kBlack = 0.02;  // of the picture; less is a line at its edge
   if (const double black = BlackShare(clip, width, *crop); black > kBlack) {
@@ -70,21 +72,21 @@ CropTrouble CropTroubleOf(SteadyClip& clip) {
           window + " stay in view; " + gentler + " or --framing stabilize-only keeps more"};
 }
 
-void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
+void CheckCrop(host::SteadyClip& clip, ProgressLine& progress) {
   const CropTrouble trouble = CropTroubleOf(clip);
   if (trouble.nothing_seen) throw SolveFailure(clip.path() + ": " + trouble.line);
   if (!trouble.line.empty()) progress.Warn(trouble.line);
 }
 
-void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress) {
+void Frame(host::SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress) {
   const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };
-  const bool may_follow = value(HX_FRAMING) == kCropAutoScale &&
+  const bool may_follow = value(HX_FRAMING) == host::kCropAutoScale &&
                           value(HX_ACTION_SAFE_MARGIN) == 0 && value(HX_ADDITIONAL_SCALE) > 0;
   // Whoever sets how calm the path is has it so, as far as the effect goes.
   const bool as_it_comes =
       value(HX_SMOOTHNESS) == HX_SMOOTHNESS.default_value &&
       value(HX_CROP_LESS_SMOOTH_MORE) == HX_CROP_LESS_SMOOTH_MORE.default_value &&
-      value(HX_RESULT) == kSmoothMotion;
+      value(HX_RESULT) == host::kSmoothMotion;
   const bool asked = flags.kind == WindowFlags::Kind::follow || flags.most_zoom > 0;
   if (asked && !may_follow) {
     throw UsageFailure(
@@ -93,11 +95,12 @@ void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress) {
   if (flags.kind == WindowFlags::Kind::steady || !may_follow || !(asked || as_it_comes)) {
     return CheckCrop(clip, progress);
   }
-  clip.FollowPicture(flags.most_zoom > 0 ? flags.most_zoom : value(HX_MAXIMUM_SCALE) / 100);
+  clip.FollowPicture(flags.most_zoom > 0 ? flags.most_zoom : value(HX_MAXIMUM_SCALE) / 100,
+                     progress);
 }
 
-void TellOutcome(SteadyClip& clip, ProgressLine& progress) {
-  if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
+void TellOutcome(host::SteadyClip& clip, ProgressLine& progress) {
+  if (!host::Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
   const host::Outcome outcome = clip.Measure();
   const auto rounded = [](double value) { return std::round(value * 10000) / 10000; };
   nlohmann::ordered_json object;
@@ -169,8 +172,8 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
                const ControlFlags& controls, const OutputFlags& flags, int threads,
                ProgressLine& progress) {
   const tessel::threads::ProcessorLimit limit(threads);
-  RunOnPromises([&](Opening opening) {
-    const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls, opening);
+  RunOnPromises([&](host::Opening opening) {
+    const std::unique_ptr<host::SteadyClip> clip = TakeUp(input, project, controls, opening);
     const media::ClipInfo& info = clip->info();
     if (!info.warning.empty()) progress.Warn(info.warning);
     KeepApart(output, {project});

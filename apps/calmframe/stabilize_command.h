@@ -6,8 +6,8 @@
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/progress_line.h"
-#include "apps/calmframe/steady_clip.h"
 #include "host/media/clip.h"
+#include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
 
@@ -51,17 +51,17 @@ struct CropTrouble {
   std::string line;
   bool nothing_seen = false;
 };
-CropTrouble CropTroubleOf(SteadyClip& clip);
+CropTrouble CropTroubleOf(host::SteadyClip& clip);
 
 // After the clip's work: chooses what is shown of it, tells what there is to tell of that, and
 // refuses a clip of which nothing would be seen. Throws SolveFailure, UsageFailure, Interrupted.
-void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress);
+void Frame(host::SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress);
 
 // What came out of it, behind all else that a run says.
-void TellOutcome(SteadyClip& clip, ProgressLine& progress);
+void TellOutcome(host::SteadyClip& clip, ProgressLine& progress);
 
 // Refuses a clip of which nothing would be seen, and tells of one that loses much.
-void CheckCrop(SteadyClip& clip, ProgressLine& progress);
+void CheckCrop(host::SteadyClip& clip, ProgressLine& progress);
 
 // `calmframe stabilize IN OUT`. Added to the program's parser; runs when that has chosen it.
 class StabilizeCommand final : public Command {

@@ -17,8 +17,8 @@ constexpr std::int32_t kSaveTracksButton = 290;  // disk id
 
 }  // namespace
 
-report::TrackTable SaveTracks(SteadyClip& clip, const std::string& work, const std::string& path,
-                              const std::string& file) {
+report::TrackTable SaveTracks(host::SteadyClip& clip, const std::string& work,
+                              const std::string& path, const std::string& file) {
   const auto fail = [&file] {
     throw media::Failure(media::Failure::Side::output, file + ": can't be written whole");
   };

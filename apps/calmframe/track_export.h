@@ -2,8 +2,8 @@
 
 #include <string>
 
-#include "apps/calmframe/steady_clip.h"
 #include "apps/report/track_table.h"
+#include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
 
@@ -11,7 +11,7 @@ namespace calmframe {
 // what the file holds, read back, since the button doesn't tell how it went. `work`, `file`: what
 // the user calls the saved work and the file. Throws SolveFailure where there are no tracks,
 // media::Failure (output) where the file isn't whole.
-report::TrackTable SaveTracks(SteadyClip& clip, const std::string& work, const std::string& path,
-                              const std::string& file);
+report::TrackTable SaveTracks(host::SteadyClip& clip, const std::string& work,
+                              const std::string& path, const std::string& file);
 
 }  // namespace calmframe
