@@ -40,7 +40,7 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
   const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
-  CheckCrop(clip, progress);
+  TellTrouble(host::CropTroubleOf(clip), clip, progress);
   if (run_.json) {
     const std::unique_ptr<host::CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;

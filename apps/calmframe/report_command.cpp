@@ -217,11 +217,12 @@ void ReportCommand::Run() {
     const report::SolveLog solve_log;
     const bool saved = clip->Work(progress).solve;
     const std::string crop = clip->CropText();
-    const CropTrouble trouble = CropTroubleOf(*clip);
-    page.lead = trouble.nothing_seen ? "Not steadied: nothing stays in view"
-                : crop.empty()       ? "Steadied, the whole frame kept"
-                                     : "Steadied: " + crop;
-    note(trouble.line);
+    const host::CropTrouble trouble = host::CropTroubleOf(*clip);
+    page.lead = trouble.kind == host::CropTrouble::Kind::nothing_seen
+                    ? "Not steadied: nothing stays in view"
+                : crop.empty() ? "Steadied, the whole frame kept"
+                               : "Steadied: " + crop;
+    note(TroubleText(trouble, *clip));
     page.controls = ControlsOf(*clip);
     const report::SolvedClip solved = SolvedOf(*clip, project_);
     const std::size_t rows = std::max<std::size_t>(solved.tracked.size(), 1);
