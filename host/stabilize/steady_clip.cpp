@@ -176,7 +176,7 @@ void SteadyClip::Settle(Watcher& watcher, Progress& shown, Reuse& reuse) {
   using Work = Session::Work;
   // By the analysis, which alone asks for frames here, and may be at work when it is first seen.
   const std::uint64_t delivered_before = host_.media().counts().delivered;
-  bool analysed = false, has_new_tracks = false;
+  bool has_new_tracks = false;
   const auto show = [&] {
     const Work work = Session::WorkOf(*effect_);
     const std::uint64_t delivered = host_.media().counts().delivered;
@@ -189,8 +189,8 @@ void SteadyClip::Settle(Watcher& watcher, Progress& shown, Reuse& reuse) {
     reuse.framing = false;
     if (work == Work::analysing) {
       reuse.analysis = false;
-      analysed = true;
-    } else if (std::exchange(analysed, false)) {
+      analysed_ = true;
+    } else if (analysed_) {
       has_new_tracks = true;
       return true;
     }
@@ -217,6 +217,7 @@ void SteadyClip::Settle(Watcher& watcher, Progress& shown, Reuse& reuse) {
       break;
     }
     TakeAsSaved();  // ahead of what is solved of them
+    analysed_ = false;
   }
   // The render that follows has its own pattern of buffers: what the analysis took goes back.
   malloc_trim(0);
@@ -236,13 +237,28 @@ void SteadyClip::Set(std::int32_t disk_id, double value) {
   if (!result.ok()) throw SolveFailure(result.Line(path()));
 }
 
+template <class Act>
+auto SteadyClip::Keeping(std::int32_t disk_id, const Act& act) {
+  const double value = ValueOf(disk_id);
+  try {
+    return act(value);
+  } catch (...) {
+    effect_->SetParam(effect_->IndexOf(disk_id), value);
+    throw;
+  }
+}
+
 Reuse SteadyClip::Work(Watcher& watcher) {
+  DrawByItself();
+  return Keeping(HX_FRAMING.disk_id,
+                 [&](double framing) { return WorkFramedLast(framing, watcher); });
+}
+
+Reuse SteadyClip::WorkFramedLast(double framing, Watcher& watcher) {
   Reuse reuse{true, true, true};
   Progress shown;
   const void* const warp = FirstWarp();
-  DrawByItself();
   // The crop window is to be that of the warps as they are saved, so it comes behind them.
-  const double framing = ValueOf(HX_FRAMING.disk_id);
   if (Crops(framing)) Set(HX_FRAMING.disk_id, kStabilizeOnly);
   Settle(watcher, shown, reuse);
   // Saved work of another span, of other settings, or of none is not begun anew by itself.
@@ -281,17 +297,18 @@ void SteadyClip::CheckResult(Watcher& watcher) {
 }
 
 void SteadyClip::SolveAnew(Watcher& watcher) {
-  const std::int32_t method = effect_->IndexOf(kMethod);
-  const double value = ValueOf(kMethod);
-  // A method that is quick to solve for, without a word; with the first one again, nothing of it
-  // stands.
-  Unseen unseen(watcher);
   Progress shown;
   Reuse ignored;
-  effect_->SetParam(method, value == 1 ? 2.0 : 1.0);
-  Settle(unseen, shown, ignored);
-  shown = {};
-  effect_->SetParam(method, value);
+  Keeping(kMethod, [&](double value) {
+    const std::int32_t method = effect_->IndexOf(kMethod);
+    // A method that is quick to solve for, without a word; with the first one again, nothing of it
+    // stands.
+    Unseen unseen(watcher);
+    effect_->SetParam(method, value == 1 ? 2.0 : 1.0);
+    Settle(unseen, shown, ignored);
+    shown = {};
+    effect_->SetParam(method, value);
+  });
   Settle(watcher, shown, ignored);
   End(watcher, shown);
   CheckResult(watcher);

@@ -60,10 +60,10 @@ class SteadyClip {
   Effect& drawn() { return drawn_ ? *drawn_ : *effect_; }
 
   // Waits until the effect has analysed and solved the clip, as far as that is to do; from then on
-  // it draws by itself, and no renderer of another one may be left. Throws Interrupted,
-  // SolveFailure, media::Failure; the last also where a clip that is gone would have to be
-  // analysed; BrokenPromise of a clip that was opened by promises, before anything is told of how
-  // the work ended.
+  // it draws by itself, and no renderer of another one may be left. Once stopped it goes on where
+  // it was. Throws Interrupted, SolveFailure, media::Failure; the last also where a clip that is
+  // gone would have to be analysed; BrokenPromise of a clip that was opened by promises, before
+  // anything is told of how the work ended.
   Reuse Work(Watcher& watcher);
 
   // Solves once more with the controls as they stand, for what only a running solve tells. Throws
@@ -103,6 +103,10 @@ class SteadyClip {
   static Medium Blank(const Project& project);
   SteadyClip(const std::string& plugin, const Project* project, const Medium& medium);
   bool IsBroken() const;
+  Reuse WorkFramedLast(double framing, Watcher& watcher);
+  // act(the parameter's value); what act throws leaves it with that value.
+  template <class Act>
+  auto Keeping(std::int32_t disk_id, const Act& act);
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`. `shown`: the
   // stage that was shown last and goes on until another one begins or End ends it.
   void Settle(Watcher& watcher, Progress& shown, Reuse& reuse);
@@ -131,6 +135,7 @@ class SteadyClip {
   Effect* drawn_ = nullptr;   // the session's; null: the effect itself
   Outcome outcome_;           // of drawn_
   bool has_new_controls_ = false;
+  bool analysed_ = false;  // anew, and what is solved of it is still to begin
 };
 
 }  // namespace calmframe::host
