@@ -314,6 +314,11 @@ void SteadyClip::SolveAnew(Watcher& watcher) {
   CheckResult(watcher);
 }
 
+SolvedClip SteadyClip::Solved() {
+  SavedEffect ignored;
+  return Solved(&ignored);
+}
+
 SolvedClip SteadyClip::Solved(SavedEffect* saved) {
   const CommandResult result = effect_->Save(saved);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
@@ -361,8 +366,7 @@ void SteadyClip::DrawByItself() {
 
 Outcome SteadyClip::Measure() {
   if (drawn_) return outcome_;
-  SavedEffect saved;
-  const SolvedClip solved = Solved(&saved);
+  const SolvedClip solved = Solved();
   const double zoom = Zoom(solved);
   Outcome outcome =
       MeasureOutcome(solved, FindBackground(solved), OwnWindows(solved, zoom), FramesPerSecond());

@@ -80,6 +80,8 @@ class SteadyClip {
 
   // Throws SolveFailure where the effect can't be saved.
   Project Saved();
+  // After Work: what is solved, as it would be saved. Throws SolveFailure.
+  SolvedClip Solved();
 
   // After Work. Null where the framing has none.
   std::unique_ptr<CropWindow> Crop();

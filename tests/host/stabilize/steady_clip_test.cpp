@@ -72,9 +72,11 @@ TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {
   for (const char* stage : {"", "analyzing", "solving"}) {
     SteadyClip clip(CALMFRAME_PLUGIN, path_);
     Onlooker hasty(stage), patient;
-    if (*stage) EXPECT_THROW(clip.Work(hasty), Interrupted) << stage;
+    if (*stage) {
+      EXPECT_THROW(clip.Work(hasty), Interrupted) << stage;
+    }
     clip.Work(patient);
-    const SolvedClip solved = ReadSolvedClip(clip.Saved().effect.instance);
+    const SolvedClip solved = clip.Solved();
     EXPECT_TRUE(solved.crop) << stage;
     if (expected.empty()) expected = solved.vertices;
     EXPECT_TRUE(solved.vertices == expected) << stage;
