@@ -9,10 +9,10 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
-#include "apps/calmframe/steady_clip.h"
 #include "apps/calmframe/track_export.h"
 #include "host/media/output_file.h"
 #include "host/project/project_file.h"
+#include "host/stabilize/steady_clip.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
@@ -60,7 +60,7 @@ RenderCommand::RenderCommand(CLI::App& program)
 void RenderCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
-  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_);
+  const std::unique_ptr<host::SteadyClip> clip = OpenSaved(project_);
   const media::ClipInfo& info = clip->info();
   const FrameRange range{from_, to_ == 0 ? info.frame_count : to_};
   if (range.first >= range.end || range.end > info.frame_count) {
@@ -129,7 +129,7 @@ TracksCommand::TracksCommand(CLI::App& program)
 
 void TracksCommand::Run() {
   media::OutputFile file(output_, project_, overwrite_);
-  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_);
+  const std::unique_ptr<host::SteadyClip> clip = OpenSaved(project_);
   KeepApart(output_, {clip->path()});
   SaveTracks(*clip, project_, file.temporary(), output_);
   file.Commit();

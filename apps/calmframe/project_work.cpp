@@ -3,6 +3,7 @@
 #include <filesystem>
 
 #include "apps/calmframe/flags.h"
+#include "apps/calmframe/plugin_path.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
@@ -24,6 +25,12 @@ void KeepPlace(const std::string& path, const std::string& clip, host::Project& 
   }
 }
 
+std::unique_ptr<host::SteadyClip> WithControls(std::unique_ptr<host::SteadyClip> clip,
+                                               const ControlFlags& controls) {
+  clip->SetControls(ResolveControls(controls, clip->host().declarations()));
+  return clip;
+}
+
 }  // namespace
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
@@ -36,11 +43,11 @@ void AddProjectFlag(CLI::App& command, std::string& project) {
           Need::optional)});
 }
 
-std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                   const ControlFlags& controls, Opening opening) {
+std::unique_ptr<host::SteadyClip> TakeUp(const std::string& clip, const std::string& project,
+                                         const ControlFlags& controls, host::Opening opening) {
   std::error_code error;
   if (project.empty() || !std::filesystem::exists(project, error)) {
-    return std::make_unique<SteadyClip>(clip, controls, opening);
+    return WithControls(std::make_unique<host::SteadyClip>(PluginPath(), clip, opening), controls);
   }
   host::Project saved = host::LoadProject(project);
   if (host::ContentOf(clip) != saved.clip_content) {
@@ -48,7 +55,7 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
                          project + ": is of another clip, " + saved.clip_path);
   }
   KeepPlace(project, clip, saved);
-  return std::make_unique<SteadyClip>(saved, clip, controls);
+  return WithControls(std::make_unique<host::SteadyClip>(PluginPath(), saved, clip), controls);
 }
 
 std::string FindMovedClip(const std::string& path, host::Project& project) {
@@ -57,10 +64,10 @@ std::string FindMovedClip(const std::string& path, host::Project& project) {
   return clip;
 }
 
-std::unique_ptr<SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
+std::unique_ptr<host::SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
   host::Project project = host::LoadProject(path);
   const std::string clip = FindMovedClip(path, project);
-  return std::make_unique<SteadyClip>(project, clip, controls);
+  return WithControls(std::make_unique<host::SteadyClip>(PluginPath(), project, clip), controls);
 }
 
 void KeepApart(const std::string& output, const std::vector<std::string>& inputs) {
@@ -83,8 +90,8 @@ void Unsaved::Throw() const {
   if (!line_.empty()) throw media::Failure(media::Failure::Side::output, line_);
 }
 
-Unsaved WorkAndLeave(SteadyClip& clip, const std::string& project, ProgressLine& progress) {
-  const Reuse reuse = clip.Work(progress);
+Unsaved WorkAndLeave(host::SteadyClip& clip, const std::string& project, ProgressLine& progress) {
+  const host::Reuse reuse = clip.Work(progress);
   if (project.empty()) return Unsaved();
   if (const std::string text = reuse.Text(); !text.empty()) progress.Note(project + ": " + text);
   if (reuse.framing && !clip.has_new_controls()) return Unsaved();

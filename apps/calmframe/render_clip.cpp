@@ -15,6 +15,7 @@
 
 #include "apps/calmframe/failures.h"
 #include "host/effects/renderer.h"
+#include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
 
 namespace calmframe {
@@ -146,7 +147,7 @@ void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer
 }
 
 bool SynthesizesEdges(const SteadyClip& clip) {
-  return clip.ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
+  return clip.ValueOf(HX_FRAMING.disk_id) == host::kSynthesizeEdges;
 }
 
 // The least that holds the source. Layers of soft edges, one on the other, add up the rounding of

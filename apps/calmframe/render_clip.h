@@ -5,11 +5,13 @@
 #include <string>
 
 #include "apps/calmframe/progress_line.h"
-#include "apps/calmframe/steady_clip.h"
 #include "host/media/clip.h"
 #include "host/pixels/world_buffer.h"
+#include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
+
+using host::SteadyClip;
 
 // Frames of a clip, the end excluded.
 struct FrameRange {
