@@ -7,7 +7,7 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/stabilize_command.h"
-#include "apps/calmframe/steady_clip.h"
+#include "host/stabilize/steady_clip.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
@@ -32,18 +32,19 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
 void AnalyzeCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
-  RunOnPromises([&](Opening opening) { Analyze(opening, progress); });
+  RunOnPromises([&](host::Opening opening) { Analyze(opening, progress); });
 }
 
-void AnalyzeCommand::Analyze(Opening opening, ProgressLine& progress) const {
-  const std::unique_ptr<SteadyClip> taken = TakeUp(input_, project_, controls_, opening, stretch_);
-  SteadyClip& clip = *taken;
+void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) const {
+  const std::unique_ptr<host::SteadyClip> taken =
+      TakeUp(input_, project_, controls_, opening, stretch_);
+  host::SteadyClip& clip = *taken;
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
   const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
-  CheckCrop(clip, progress);
+  TellTrouble(host::CropTroubleOf(clip), clip, progress);
   if (run_.json) {
-    const std::unique_ptr<CropWindow> crop = clip.Crop();
+    const std::unique_ptr<host::CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;
     json["clip"] = input_;
     json["width"] = info.width;

@@ -6,7 +6,7 @@
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/stabilize_command.h"
-#include "apps/calmframe/steady_clip.h"
+#include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
 
@@ -19,7 +19,7 @@ class AnalyzeCommand final : public Command {
   void Run() override;
 
  private:
-  void Analyze(Opening opening, ProgressLine& progress) const;
+  void Analyze(host::Opening opening, ProgressLine& progress) const;
 
   std::string input_, project_;
   Stretch stretch_;

@@ -11,8 +11,8 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
 #include "host/base/nearest_match.h"
+#include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
-#include "platform/tessel/debug.h"
 
 namespace calmframe {
 namespace {
@@ -58,17 +58,17 @@ const std::vector<Flag>& Flags() {
        kControls},
       {"--result",
        Popup{HX_RESULT,
-             {{"smooth-motion", kSmoothMotion, "keeps them but calms them"},
-              {"no-motion", kNoMotion, "holds the picture still as on a tripod"}}},
+             {{"smooth-motion", host::kSmoothMotion, "keeps them but calms them"},
+              {"no-motion", host::kNoMotion, "holds the picture still as on a tripod"}}},
        "The camera's own moves", kControls},
       {"--framing",
-       Popup{
-           HX_FRAMING,
-           {{"crop-auto-scale", kCropAutoScale,
-             "cuts them off and enlarges the rest to the full frame"},
-            {"crop", kCrop, "only cuts them off"},
-            {"stabilize-only", kStabilizeOnly, "shows them"},
-            {"synthesize-edges", kSynthesizeEdges, "fills them from the frames before and after"}}},
+       Popup{HX_FRAMING,
+             {{"crop-auto-scale", host::kCropAutoScale,
+               "cuts them off and enlarges the rest to the full frame"},
+              {"crop", host::kCrop, "only cuts them off"},
+              {"stabilize-only", host::kStabilizeOnly, "shows them"},
+              {"synthesize-edges", host::kSynthesizeEdges,
+               "fills them from the frames before and after"}}},
        "The edges that the motion lays bare", kControls},
       {"--method",
        Popup{HX_METHOD,
@@ -208,14 +208,6 @@ void AddControlFlags(CLI::App& command, ControlFlags& flags) {
 bool HasFlag(std::int32_t disk_id) {
   return std::any_of(Flags().begin(), Flags().end(),
                      [disk_id](const Flag& flag) { return DiskIdOf(flag) == disk_id; });
-}
-
-void DeclareExperimentalParameters() {
-  constexpr char kOption[] = "ShowExperimentalEffectParameters";
-  if (tessel::debug::DebugDatabase::GetBool(kOption)) return;
-  tessel::debug::DebugDatabase::Set(kOption, 1);
-  // The solve's log comes with the option; who wants that sets it in the environment.
-  tessel::debug::SetSink([](const std::string&) {});
 }
 
 std::vector<HX_ParamDef> OfferedParams(const ControlFlags& flags,

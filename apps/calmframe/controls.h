@@ -10,13 +10,6 @@
 
 namespace calmframe {
 
-// Items of HX_FRAMING, and of HX_RESULT.
-inline constexpr double kStabilizeOnly = 1, kCrop = 2, kCropAutoScale = 3, kSynthesizeEdges = 4;
-inline constexpr double kSmoothMotion = 1, kNoMotion = 2;
-inline bool Crops(double framing) {
-  return framing == kCrop || framing == kCropAutoScale;
-}
-
 // How a command line sets the effect's controls.
 struct ControlFlags {
   std::map<std::int32_t, double> values;  // of the controls with a flag, by disk id; those given
@@ -29,10 +22,6 @@ void AddControlFlags(CLI::App& command, ControlFlags& flags);
 
 // Whether a parameter has a flag of its own.
 bool HasFlag(std::int32_t disk_id);
-
-// To be called before the effect is loaded: whether it declares its experimental parameters is
-// settled then. The program sets some of them by itself, whatever it offers.
-void DeclareExperimentalParameters();
 
 // The parameters that are offered, of all that the effect declares.
 std::vector<HX_ParamDef> OfferedParams(const ControlFlags& flags,

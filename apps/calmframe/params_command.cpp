@@ -61,11 +61,12 @@ ParamsCommand::ParamsCommand(CLI::App& program)
 }
 
 void ParamsCommand::Run() {
-  DeclareExperimentalParameters();
+  host::HostSettings settings;
+  settings.experimental_parameters = true;  // which of them are offered is seen to below
   std::vector<HX_ParamDef> params;
   nlohmann::ordered_json list = nlohmann::ordered_json::array();
   try {
-    const host::Host host(PluginPath());
+    const host::Host host(PluginPath(), settings);
     std::map<std::int32_t, double> given = ResolveControls(controls_, host.declarations());
     if (!project_.empty()) given.merge(host::LoadProject(project_).effect.values);
     for (const HX_ParamDef& param : OfferedParams(controls_, host.declarations())) {

@@ -129,6 +129,10 @@ void ProgressLine::Warn(const std::string& line) {
   if (warned_.insert(line).second) Tell("warning", line);
 }
 
+bool ProgressLine::Stops() {
+  return InterruptAsked();
+}
+
 void ProgressLine::Note(const std::string& line) {
   if (form_ == Form::line || form_ == Form::json) Tell("note", line);
 }

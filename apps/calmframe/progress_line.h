@@ -7,32 +7,28 @@
 #include <utility>
 #include <vector>
 
+#include "host/stabilize/watcher.h"
+
 namespace calmframe {
 
-// How far a stage has come.
-struct Progress {
-  std::string stage;
-  double done = 0, total = 0;  // total 0: nobody knows
-  std::string unit;            // of both; empty for a mere share
-  std::string says;            // what the effect shows its user meanwhile; may be empty
-  bool ends = false;
-  bool lasts = false;  // nothing more may be told for a while
-};
+using host::Progress;
 
 // Shows progress on the standard error: on a terminal one line that is written over, elsewhere a
 // line at the start and the end of each stage; or, for programs, one JSON object a line.
-class ProgressLine {
+class ProgressLine final : public host::Watcher {
  public:
   // json_end: as JSON, but no progress and no notes.
   enum class Form { none, line, json, json_end };
   explicit ProgressLine(Form form);
-  ~ProgressLine();
+  ~ProgressLine() override;
   ProgressLine(const ProgressLine&) = delete;
   ProgressLine& operator=(const ProgressLine&) = delete;
 
-  void Show(const Progress& progress);
-  // One line that the user should see, in every form; said once, however often it comes.
-  void Warn(const std::string& line);
+  void Show(const Progress& progress) override;
+  // In every form; said once, however often it comes.
+  void Warn(const std::string& line) override;
+  // See InterruptAsked.
+  bool Stops() override;
   // One line about how things went.
   void Note(const std::string& line);
   // What came out of it all: the line, or for programs the object, both with the seconds that each

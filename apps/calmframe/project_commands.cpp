@@ -8,10 +8,10 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
-#include "apps/calmframe/steady_clip.h"
 #include "apps/calmframe/track_export.h"
 #include "host/media/output_file.h"
 #include "host/project/project_file.h"
+#include "host/stabilize/steady_clip.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
@@ -38,7 +38,7 @@ void RenderCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
   CheckOrder(stretch_);
-  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_);
+  const std::unique_ptr<host::SteadyClip> clip = OpenSaved(project_);
   const media::FrameRange range = RangeOf(*clip);
   // As the clip's own frames; the rest counts from the first that was worked.
   const media::FrameRange part{range.first - clip->range().first, range.end - clip->range().first};
@@ -57,7 +57,7 @@ void RenderCommand::Run() {
   if (both) both->Throw();
 }
 
-media::FrameRange RenderCommand::RangeOf(const SteadyClip& clip) const {
+media::FrameRange RenderCommand::RangeOf(const host::SteadyClip& clip) const {
   if (!stretch_.is_given()) return clip.range();
   media::FrameRange range = FramesOf(stretch_, clip.whole());
   const media::FrameRange& worked = clip.range();
@@ -121,7 +121,7 @@ TracksCommand::TracksCommand(CLI::App& program)
 
 void TracksCommand::Run() {
   media::OutputFile file(output_, project_, overwrite_);
-  const std::unique_ptr<SteadyClip> clip = OpenSaved(project_);
+  const std::unique_ptr<host::SteadyClip> clip = OpenSaved(project_);
   KeepApart(output_, {clip->path()});
   SaveTracks(*clip, project_, file.temporary(), output_);
   file.Commit();

@@ -18,7 +18,7 @@ class RenderCommand final : public Command {
 
  private:
   // Of the clip's frames. Throws UsageFailure where not all of them were worked.
-  media::FrameRange RangeOf(const SteadyClip& clip) const;
+  media::FrameRange RangeOf(const host::SteadyClip& clip) const;
 
   std::string project_, output_;
   Stretch stretch_;

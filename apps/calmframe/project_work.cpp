@@ -3,6 +3,7 @@
 #include <filesystem>
 
 #include "apps/calmframe/flags.h"
+#include "apps/calmframe/plugin_path.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
@@ -30,6 +31,12 @@ std::filesystem::path PlaceOf(const std::string& path, std::error_code& error) {
   return error ? whole : std::filesystem::weakly_canonical(whole, error);
 }
 
+std::unique_ptr<host::SteadyClip> WithControls(std::unique_ptr<host::SteadyClip> clip,
+                                               const ControlFlags& controls) {
+  clip->SetControls(ResolveControls(controls, clip->host().declarations()));
+  return clip;
+}
+
 }  // namespace
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
@@ -42,13 +49,15 @@ void AddProjectFlag(CLI::App& command, std::string& project) {
           Need::optional)});
 }
 
-std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                   const ControlFlags& controls, Opening opening,
-                                   const Stretch& stretch) {
+std::unique_ptr<host::SteadyClip> TakeUp(const std::string& clip, const std::string& project,
+                                         const ControlFlags& controls, host::Opening opening,
+                                         const Stretch& stretch) {
   CheckOrder(stretch);
   std::error_code error;
   if (project.empty() || !std::filesystem::exists(project, error)) {
-    return std::make_unique<SteadyClip>(clip, controls, opening, stretch);
+    return WithControls(
+        std::make_unique<host::SteadyClip>(PluginPath(), clip, opening, PartFor(stretch)),
+        controls);
   }
   host::Project saved = host::LoadProject(project);
   if (host::ContentOf(clip) != saved.clip_content) {
@@ -56,16 +65,16 @@ std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& p
                          project + ": is of another clip, " + saved.clip_path);
   }
   KeepPlace(project, clip, saved);
-  auto taken = std::make_unique<SteadyClip>(saved, clip, controls);
+  auto taken = std::make_unique<host::SteadyClip>(PluginPath(), saved, clip);
   if (stretch.is_given() && FramesOf(stretch, taken->whole()) != taken->range()) {
     throw UsageFailure(project + ": " + WorkedText(*taken) +
                        "; another stretch takes a project of its own, and a part of this one is "
                        "drawn by calmframe render");
   }
-  return taken;
+  return WithControls(std::move(taken), controls);
 }
 
-std::string WorkedText(const SteadyClip& clip) {
+std::string WorkedText(const host::SteadyClip& clip) {
   const media::FrameRange& worked = clip.range();
   return "holds work from " + TimeText(clip.whole(), worked.first) + " to " +
          TimeText(clip.whole(), worked.end) + " of the clip, frames " +
@@ -78,10 +87,10 @@ std::string FindMovedClip(const std::string& path, host::Project& project) {
   return clip;
 }
 
-std::unique_ptr<SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
+std::unique_ptr<host::SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
   host::Project project = host::LoadProject(path);
   const std::string clip = FindMovedClip(path, project);
-  return std::make_unique<SteadyClip>(project, clip, controls);
+  return WithControls(std::make_unique<host::SteadyClip>(PluginPath(), project, clip), controls);
 }
 
 void KeepApart(const std::string& output, const std::vector<std::string>& inputs,
@@ -104,8 +113,8 @@ void Unsaved::Throw() const {
   if (!line_.empty()) throw media::Failure(media::Failure::Side::output, line_);
 }
 
-Unsaved WorkAndLeave(SteadyClip& clip, const std::string& project, ProgressLine& progress) {
-  const Reuse reuse = clip.Work(progress);
+Unsaved WorkAndLeave(host::SteadyClip& clip, const std::string& project, ProgressLine& progress) {
+  const host::Reuse reuse = clip.Work(progress);
   if (project.empty()) return Unsaved();
   if (const std::string text = reuse.Text(); !text.empty()) progress.Note(project + ": " + text);
   if (reuse.framing && !clip.has_new_controls()) return Unsaved();

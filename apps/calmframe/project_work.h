@@ -8,7 +8,8 @@
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/progress_line.h"
-#include "apps/calmframe/steady_clip.h"
+#include "apps/calmframe/stretch.h"
+#include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
 
@@ -18,23 +19,23 @@ void AddProjectFlag(CLI::App& command, std::string& project);
 // file; such a clip may not be read in order, so nothing is taken for promised. Throws
 // media::Failure when the work is of another clip, UsageFailure when it is of another stretch; one
 // that is not given is that of the work.
-std::unique_ptr<SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                   const ControlFlags& controls, Opening opening,
-                                   const Stretch& stretch);
+std::unique_ptr<host::SteadyClip> TakeUp(const std::string& clip, const std::string& project,
+                                         const ControlFlags& controls, host::Opening opening,
+                                         const Stretch& stretch);
 
 // Calls run(opening): by what the clip's container promises, which spares decoding it once more
 // than its analysis does, and where the frames break that from the start once more.
 template <class Run>
 void RunOnPromises(const Run& run) {
   try {
-    return run(Opening::promised);
+    return run(host::Opening::promised);
   } catch (const BrokenPromise&) {
   }
-  run(Opening::decoded);
+  run(host::Opening::decoded);
 }
 
 // "holds work from 0:10 to 0:25 of the clip, frames 300 to 750", the end left out.
-std::string WorkedText(const SteadyClip& clip);
+std::string WorkedText(const host::SteadyClip& clip);
 
 // Where the clip of saved work lies, which the work's file knows from now on. Throws as
 // host::FindClip.
@@ -42,8 +43,8 @@ std::string FindMovedClip(const std::string& path, host::Project& project);
 
 // The clip of saved work, found by its name or beside it. Throws media::Failure,
 // host::ProjectFailure.
-std::unique_ptr<SteadyClip> OpenSaved(const std::string& project,
-                                      const ControlFlags& controls = {});
+std::unique_ptr<host::SteadyClip> OpenSaved(const std::string& project,
+                                            const ControlFlags& controls = {});
 
 // Nothing of the user's is written over by a result of it: throws media::Failure (output) where
 // `output` is one of `inputs` under any name. Empty names stand for no file. `what` one of them is,
@@ -65,7 +66,7 @@ class Unsaved {
 
 // Does what is left to do, tells what was reused, and saves what is new. No project is an empty
 // name.
-[[nodiscard]] Unsaved WorkAndLeave(SteadyClip& clip, const std::string& project,
+[[nodiscard]] Unsaved WorkAndLeave(host::SteadyClip& clip, const std::string& project,
                                    ProgressLine& progress);
 
 }  // namespace calmframe

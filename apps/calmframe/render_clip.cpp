@@ -15,6 +15,7 @@
 
 #include "apps/calmframe/failures.h"
 #include "host/effects/renderer.h"
+#include "host/stabilize/control_items.h"
 #include "host/timeline/layer.h"
 #include "platform/hx/hx_controls.h"
 
@@ -146,7 +147,7 @@ class RenderAhead {
 };
 
 bool SynthesizesEdges(const SteadyClip& clip) {
-  return clip.ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
+  return clip.ValueOf(HX_FRAMING.disk_id) == host::kSynthesizeEdges;
 }
 
 // The least that holds the source. Layers of soft edges, one on the other, add up the rounding of

@@ -8,12 +8,14 @@
 
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/side_by_side.h"
-#include "apps/calmframe/steady_clip.h"
 #include "host/media/clip.h"
 #include "host/pixels/world_buffer.h"
+#include "host/stabilize/steady_clip.h"
 #include "host/timeline/picture.h"
 
 namespace calmframe {
+
+using host::SteadyClip;
 
 // A frame as it is to be written.
 struct DrawnFrame {

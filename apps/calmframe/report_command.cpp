@@ -1,7 +1,5 @@
 #include "apps/calmframe/report_command.h"
 
-#include <unistd.h>
-
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
@@ -11,18 +9,17 @@
 #include <utility>
 #include <vector>
 
-#include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
+#include "apps/calmframe/plugin_path.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
-#include "apps/calmframe/track_export.h"
 #include "apps/report/data_url.h"
 #include "apps/report/model_scores.h"
 #include "apps/report/page.h"
 #include "apps/report/plot.h"
+#include "apps/report/solve_figures.h"
 #include "apps/report/solve_section.h"
-#include "apps/report/solved_clip.h"
 #include "host/effects/param_table.h"
 #include "host/media/output_file.h"
 #include "host/timeline/layer.h"
@@ -55,7 +52,7 @@ double EmptyShare(const host::WorldBuffer& pixels) {
 }
 
 // Those that a person sets, and of the experts' those that were changed.
-std::vector<report::Fact> ControlsOf(SteadyClip& clip) {
+std::vector<report::Fact> ControlsOf(host::SteadyClip& clip) {
   std::vector<report::Fact> facts;
   for (const HX_ParamDef& declared : clip.host().declarations()) {
     const auto param = clip.effect().Param(clip.effect().IndexOf(declared.disk_id));
@@ -68,41 +65,14 @@ std::vector<report::Fact> ControlsOf(SteadyClip& clip) {
   return facts;
 }
 
-// A folder that goes with the object.
-class ScratchFolder {
- public:
-  ScratchFolder() {
-    std::string name = (fs::temp_directory_path() / "calmframe-XXXXXX").string();
-    if (!mkdtemp(name.data())) throw SolveFailure("no folder for temporary files can be made");
-    path_ = name;
-  }
-  ~ScratchFolder() {
-    std::error_code ignored;
-    fs::remove_all(path_, ignored);
-  }
-  ScratchFolder(const ScratchFolder&) = delete;
-  ScratchFolder& operator=(const ScratchFolder&) = delete;
-  const fs::path& path() const { return path_; }
-
- private:
-  fs::path path_;
-};
-
 double PixelAspectOf(const media::ClipInfo& info) {
   return static_cast<double>(info.pixel_aspect.num) / static_cast<double>(info.pixel_aspect.den);
 }
 
-// `shown`: what the user calls the work.
-report::SolvedClip SolvedOf(SteadyClip& clip, const std::string& shown) {
-  const ScratchFolder folder;
-  const std::string path = folder.path() / "tracks.trk";
-  const report::TrackTable tracks = SaveTracks(clip, shown, path, path);
-  std::optional<report::SolvedClip> solved =
-      report::ReadSolve(clip.host().library().exports(), clip.effect().opaque_data(), tracks,
-                        PixelAspectOf(clip.info()));
-  if (!solved) throw SolveFailure(shown + ": holds no solve");
-  if (clip.info().field_order != media::FieldOrder::progressive) solved->row = "field";
-  return *solved;
+report::SolveFigures FiguresOf(host::SteadyClip& clip) {
+  report::SolveFigures figures = report::FiguresOf(clip.Solved());
+  if (clip.info().field_order != media::FieldOrder::progressive) figures.row = "field";
+  return figures;
 }
 
 // Moments in even steps, pictures to be had.
@@ -121,7 +91,7 @@ std::vector<report::FilmFrame> Moments(const media::ClipInfo& info) {
 
 // Draws the whole clip, small: how much of each frame is left empty, percent, the pictures of the
 // film's moments, and what the effect says of frames.
-std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
+std::vector<double> Draw(host::SteadyClip& clip, int threads, ProgressLine& progress,
                          std::vector<report::FilmFrame>& film, std::vector<std::string>& said) {
   const media::ClipInfo& info = clip.info();
   const double aspect = PixelAspectOf(info);
@@ -151,16 +121,16 @@ std::vector<double> Draw(SteadyClip& clip, int threads, ProgressLine& progress,
 }
 
 // The clip of saved work, or where that is gone a stand-in for it, and a line that says so.
-std::unique_ptr<SteadyClip> OpenForReport(const std::string& path, std::string* gone) {
+std::unique_ptr<host::SteadyClip> OpenForReport(const std::string& path, std::string* gone) {
   host::Project project = host::LoadProject(path);
   std::string clip;
   try {
     clip = FindMovedClip(path, project);
   } catch (const host::ProjectFailure& failure) {
     *gone = failure.what();
-    return std::make_unique<SteadyClip>(project, ControlFlags());
+    return std::make_unique<host::SteadyClip>(PluginPath(), project);
   }
-  return std::make_unique<SteadyClip>(project, clip, ControlFlags());
+  return std::make_unique<host::SteadyClip>(PluginPath(), project, clip);
 }
 
 std::string NameOf(const std::string& path) {
@@ -190,7 +160,7 @@ void ReportCommand::Run() {
   ProgressLine progress(run_.progress_form());
   media::OutputFile file(output_, project_, overwrite_);
   std::string gone;
-  const std::unique_ptr<SteadyClip> clip = OpenForReport(project_, &gone);
+  const std::unique_ptr<host::SteadyClip> clip = OpenForReport(project_, &gone);
   KeepApart(output_, {clip->path()});
   const media::ClipInfo& info = clip->info();
   const double rate =
@@ -218,26 +188,27 @@ void ReportCommand::Run() {
     const report::SolveLog solve_log;
     const bool saved = clip->Work(progress).solve;
     const std::string crop = clip->CropText();
-    const CropTrouble trouble = CropTroubleOf(*clip);
-    page.lead = trouble.nothing_seen ? "Not steadied: nothing stays in view"
-                : crop.empty()       ? "Steadied, the whole frame kept"
-                                     : "Steadied: " + crop;
-    note(trouble.line);
+    const host::CropTrouble trouble = host::CropTroubleOf(*clip);
+    page.lead = trouble.kind == host::CropTrouble::Kind::nothing_seen
+                    ? "Not steadied: nothing stays in view"
+                : crop.empty() ? "Steadied, the whole frame kept"
+                               : "Steadied: " + crop;
+    note(TroubleText(trouble, *clip));
     page.controls = ControlsOf(*clip);
-    const report::SolvedClip solved = SolvedOf(*clip, project_);
-    const std::size_t rows = std::max<std::size_t>(solved.tracked.size(), 1);
+    const report::SolveFigures figures = FiguresOf(*clip);
+    const std::size_t rows = std::max<std::size_t>(figures.tracked.size(), 1);
     page.seconds_a_value = static_cast<double>(info.frame_count) / rate / static_cast<double>(rows);
     std::vector<report::FilmFrame> film = Moments(info);
     std::vector<std::string> said;
     const std::vector<double> empty = Draw(*clip, run_.threads, progress, film, said);
     for (const std::string& line : said) {
-      if (!trouble.nothing_seen) note(line);
+      if (trouble.kind != host::CropTrouble::Kind::nothing_seen) note(line);
     }
     if (gone.empty()) page.film = std::move(film);
     // Saved work doesn't keep how the models were chosen: a solve of the same tells it again. It
     // comes last, since tracks are saved in steps of 1/32 pixel, which moves its warps a little.
     if (saved) clip->SolveAnew(progress);
-    report::AddSolve(solved, solve_log.Scores(rows), page);
+    report::AddSolve(figures, solve_log.Scores(rows), page);
     report::AddEmptyShares(empty, rows, page);
     if (rows < 2) page.plots.clear();  // of points nothing can be read
   }

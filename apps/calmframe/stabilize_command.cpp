@@ -1,6 +1,5 @@
 #include "apps/calmframe/stabilize_command.h"
 
-#include <algorithm>
 #include <cmath>
 #include <memory>
 #include <nlohmann/json.hpp>
@@ -10,108 +9,65 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
+#include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
-namespace {
 
-constexpr std::int32_t kSafeMargin = HX_ACTION_SAFE_MARGIN.disk_id;
-constexpr std::int32_t kMaximumScale = HX_MAXIMUM_SCALE.disk_id;
-constexpr std::int32_t kAdditionalScale = HX_ADDITIONAL_SCALE.disk_id;
-
-// The share of the picture that stays black because the controls stop its enlargement, 0 to 1.
-double BlackShare(const SteadyClip& clip, double width, const CropWindow& crop) {
-  // Whoever asks for a border or a smaller picture has one.
-  if (clip.ValueOf(HX_FRAMING.disk_id) != kCropAutoScale || clip.ValueOf(kSafeMargin) > 0 ||
-      clip.ValueOf(kAdditionalScale) < 100) {
-    return 0;
-  }
-  const double most = clip.ValueOf(kMaximumScale) / 100 * clip.ValueOf(kAdditionalScale) / 100;
-  return 1 - std::min(1.0, most * crop.width / width) *
-                 std::min(1.0, most * crop.height / clip.info().height);
-}
-
-}  // namespace
-
-CropTrouble CropTroubleOf(SteadyClip& clip) {
-  if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return {};
-  const std::unique_ptr<CropWindow> crop = clip.Crop();
-  if (!crop || crop->width <= 0 || crop->height <= 0) {
-    return {
-        "no part of the picture stays in view; set --framing stabilize-only or adjust other flags",
-        true};
-  }
-  const media::ClipInfo& info = clip.info();
-  const double width = static_cast<double>(info.width) *
-                       static_cast<double>(info.pixel_aspect.num) /
-                       static_cast<double>(info.pixel_aspect.den);
+std::string TroubleText(const host::CropTrouble& trouble, const host::SteadyClip& clip) {
+  using Kind = host::CropTrouble::Kind;
   // Without motion there is nothing to smooth.
-  const std::string gentler =
-      clip.ValueOf(HX_RESULT.disk_id) == kNoMotion ? "--result smooth-motion" : "less --smoothness";
-  const std::string window = std::to_string(crop->width) + "x" + std::to_string(crop->height);
-  constexpr double kBlack = 0.02;  // of the picture; less is a line at its edge
-  if (const double black = BlackShare(clip, width, *crop); black > kBlack) {
-    // The additional scale enlarges what the maximum scale has let through.
-    const double needed = std::max(width / crop->width, double(info.height) / crop->height) * 100 /
-                          clip.ValueOf(kAdditionalScale);
-    const double percent = std::ceil(100 * needed);
-    const std::string would_fill =
-        percent <= HX_MAXIMUM_SCALE.max
-            ? " and would fill it at --maximum-scale " + std::to_string(static_cast<int>(percent))
-            : "";
-    return {std::to_string(std::lround(100 * black)) +
-            " % of the picture stays black: the crop window is " + window + would_fill + "; " +
-            gentler + " crops less"};
+  const std::string gentler = clip.ValueOf(HX_RESULT.disk_id) == host::kNoMotion
+                                  ? "--result smooth-motion"
+                                  : "less --smoothness";
+  const std::string window =
+      std::to_string(trouble.window.width) + "x" + std::to_string(trouble.window.height);
+  switch (trouble.kind) {
+    case Kind::none:
+      return "";
+    case Kind::nothing_seen:
+      return "no part of the picture stays in view; set --framing stabilize-only or adjust other "
+             "flags";
+    case Kind::black: {
+      const std::string would_fill =
+          trouble.needed_percent <= HX_MAXIMUM_SCALE.max
+              ? " and would fill it at --maximum-scale " +
+                    std::to_string(static_cast<int>(trouble.needed_percent))
+              : "";
+      return std::to_string(std::lround(100 * trouble.black)) +
+             " % of the picture stays black: the crop window is " + window + would_fill + "; " +
+             gentler + " crops less";
+    }
+    default:
+      return "of " + std::to_string(clip.info().width) + "x" + std::to_string(clip.info().height) +
+             " pixels only " + window + " stay in view; " + gentler +
+             " or --framing stabilize-only keeps more";
   }
-  constexpr double kSmall = 0.4;  // of a side
-  if (crop->width >= kSmall * width && crop->height >= kSmall * info.height) return {};
-  return {"of " + std::to_string(info.width) + "x" + std::to_string(info.height) + " pixels only " +
-          window + " stay in view; " + gentler + " or --framing stabilize-only keeps more"};
 }
 
-void CheckCrop(SteadyClip& clip, ProgressLine& progress) {
-  const CropTrouble trouble = CropTroubleOf(clip);
-  if (trouble.nothing_seen) throw SolveFailure(clip.path() + ": " + trouble.line);
-  if (!trouble.line.empty()) progress.Warn(trouble.line);
+void TellTrouble(const host::CropTrouble& trouble, const host::SteadyClip& clip,
+                 ProgressLine& progress) {
+  const std::string line = TroubleText(trouble, clip);
+  if (trouble.kind == host::CropTrouble::Kind::nothing_seen) {
+    throw SolveFailure(clip.path() + ": " + line);
+  }
+  if (!line.empty()) progress.Warn(line);
 }
 
-void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress) {
-  const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };
-  const bool may_follow = value(HX_FRAMING) == kCropAutoScale &&
-                          value(HX_ACTION_SAFE_MARGIN) == 0 && value(HX_ADDITIONAL_SCALE) > 0;
-  // Whoever sets how calm the path is has it so, as far as the effect goes.
-  const bool as_it_comes =
-      value(HX_SMOOTHNESS) == HX_SMOOTHNESS.default_value &&
-      value(HX_CROP_LESS_SMOOTH_MORE) == HX_CROP_LESS_SMOOTH_MORE.default_value &&
-      value(HX_RESULT) == kSmoothMotion;
-  const bool asked = flags.kind == WindowFlags::Kind::follow || flags.most_zoom > 0;
-  if (asked && !may_follow) {
+void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressLine& progress) {
+  try {
+    TellTrouble(host::ChooseFraming(clip, window, progress), clip, progress);
+  } catch (const host::WindowRefused&) {
     throw UsageFailure(
         "a window that follows the picture needs --framing crop-auto-scale and no margin");
   }
-  if (flags.kind == WindowFlags::Kind::steady || !may_follow || !(asked || as_it_comes)) {
-    return CheckCrop(clip, progress);
-  }
-  clip.FollowPicture(flags.most_zoom > 0 ? flags.most_zoom : value(HX_MAXIMUM_SCALE) / 100);
 }
 
-void TellOutcome(SteadyClip& clip, ProgressLine& progress) {
-  if (!Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
+void TellOutcome(host::SteadyClip& clip, ProgressLine& progress) {
+  if (!host::Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
   const host::Outcome outcome = clip.Measure();
-  const auto rounded = [](double value) { return std::round(value * 10000) / 10000; };
-  nlohmann::ordered_json object;
-  object["window"] = outcome.follows ? "follow" : "steady";
-  object["bends"] = outcome.bends;
-  object["width_kept"] = rounded(outcome.width_kept);
-  object["most_zoom"] = rounded(outcome.most_zoom);
-  object["most_black"] = rounded(outcome.most_black);
-  object["shake_before"] = rounded(outcome.before.mean);
-  object["shake_after"] = rounded(outcome.after.mean);
-  object["decibels"] = rounded(outcome.decibels());
-  object["worst_shake"] = rounded(outcome.after.worst);
-  object["worst_at"] = rounded(outcome.after.worst_at);
-  progress.End(outcome.Text(), object);
+  progress.End(outcome.Text(), outcome.Json());
 }
 
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
@@ -131,8 +87,8 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
   CLI::Option* const window = AddChoice(
       command, "--window",
       [&flags](const std::string& name) {
-        flags.window.kind =
-            name == "follow" ? WindowFlags::Kind::follow : WindowFlags::Kind::steady;
+        flags.window.kind = name == "follow" ? host::WindowSettings::Kind::follow
+                                             : host::WindowSettings::Kind::steady;
       },
       {"follow", "steady"},
       "What of each frame is shown: a part that follows the picture, which leaves nothing black "
@@ -194,8 +150,9 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
                const Stretch& stretch, const ControlFlags& controls, const OutputFlags& flags,
                int threads, ProgressLine& progress) {
   const tessel::threads::ProcessorLimit limit(threads);
-  RunOnPromises([&](Opening opening) {
-    const std::unique_ptr<SteadyClip> clip = TakeUp(input, project, controls, opening, stretch);
+  RunOnPromises([&](host::Opening opening) {
+    const std::unique_ptr<host::SteadyClip> clip =
+        TakeUp(input, project, controls, opening, stretch);
     const media::ClipInfo& info = clip->info();
     if (!info.warning.empty()) progress.Warn(info.warning);
     KeepApart(output, {project});

@@ -9,9 +9,10 @@
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/side_by_side.h"
-#include "apps/calmframe/steady_clip.h"
 #include "apps/calmframe/stretch.h"
 #include "host/media/clip.h"
+#include "host/stabilize/framing.h"
+#include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
 
@@ -28,17 +29,9 @@ struct RunFlags {
 };
 void AddRunFlags(CLI::App& command, RunFlags& flags);
 
-// What of each frame is shown.
-struct WindowFlags {
-  // The effect's own crop window, or one that follows the picture. By the controls: the latter
-  // where all that shape the path and its window are as they come.
-  enum class Kind { by_controls, steady, follow } kind = Kind::by_controls;
-  double most_zoom = 0;  // 0: as the control Maximum Scale has it
-};
-
 // How the result is framed and written.
 struct OutputFlags {
-  WindowFlags window;
+  host::WindowSettings window;
   media::EncodeSettings encode;
   int depth = 0;  // see RenderClip
   bool warning_banner = false;
@@ -62,22 +55,19 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
                const Stretch& stretch, const ControlFlags& controls, const OutputFlags& flags,
                int threads, ProgressLine& progress);
 
-// What a user should know of the crop: that much is lost, or all. No line where all is well.
-struct CropTrouble {
-  std::string line;
-  bool nothing_seen = false;
-};
-CropTrouble CropTroubleOf(SteadyClip& clip);
+// One line, with the flags that help; empty where all is well.
+std::string TroubleText(const host::CropTrouble& trouble, const host::SteadyClip& clip);
 
-// After the clip's work: chooses what is shown of it, tells what there is to tell of that, and
-// refuses a clip of which nothing would be seen. Throws SolveFailure, UsageFailure, Interrupted.
-void Frame(SteadyClip& clip, const WindowFlags& flags, ProgressLine& progress);
+// Refuses a clip of which nothing would be seen, by SolveFailure, and tells of one that loses much.
+void TellTrouble(const host::CropTrouble& trouble, const host::SteadyClip& clip,
+                 ProgressLine& progress);
+
+// After the clip's work: chooses what is shown of it, and tells what there is to tell of that.
+// Throws SolveFailure, UsageFailure, Interrupted.
+void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressLine& progress);
 
 // What came out of it, behind all else that a run says.
-void TellOutcome(SteadyClip& clip, ProgressLine& progress);
-
-// Refuses a clip of which nothing would be seen, and tells of one that loses much.
-void CheckCrop(SteadyClip& clip, ProgressLine& progress);
+void TellOutcome(host::SteadyClip& clip, ProgressLine& progress);
 
 // `calmframe stabilize IN OUT`. Added to the program's parser; runs when that has chosen it.
 class StabilizeCommand final : public Command {

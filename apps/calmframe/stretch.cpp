@@ -157,6 +157,11 @@ media::FrameRange FramesOf(const Stretch& stretch, const media::ClipInfo& clip) 
   return range;
 }
 
+media::ClipReader::Part PartFor(const Stretch& stretch) {
+  if (!stretch.is_given()) return {};
+  return [stretch](const media::ClipInfo& clip) { return FramesOf(stretch, clip); };
+}
+
 std::string TimeText(const media::ClipInfo& clip, std::size_t frame) {
   const auto thousandths = std::llround(SecondsAt(clip, frame) * 1000);
   const auto minutes = thousandths / 60000;

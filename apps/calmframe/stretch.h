@@ -36,6 +36,9 @@ void CheckOrder(const Stretch& stretch);
 // behind the end is the end for `to`. clip: a whole one. Throws UsageFailure.
 media::FrameRange FramesOf(const Stretch& stretch, const media::ClipInfo& clip);
 
+// The same for a reader; none where all frames are meant.
+media::ClipReader::Part PartFor(const Stretch& stretch);
+
 // "1:05.3": the time of a frame, or of the clip's end, as these flags take it.
 std::string TimeText(const media::ClipInfo& clip, std::size_t frame);
 

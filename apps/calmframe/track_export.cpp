@@ -4,7 +4,6 @@
 #include <fstream>
 #include <optional>
 #include <system_error>
-#include <utility>
 
 #include "apps/calmframe/failures.h"
 #include "host/media/clip.h"
@@ -15,10 +14,29 @@ namespace {
 
 constexpr std::int32_t kSaveTracksButton = 290;  // disk id
 
+// As docs/track_file.md has it: as many cells as the header tells of.
+bool IsWhole(const std::string& path) {
+  constexpr std::int64_t kMarker = -11;
+  constexpr std::uintmax_t kHeaderBytes = 20, kCellBytes = 16;
+  std::error_code error;
+  const std::uintmax_t bytes = std::filesystem::file_size(path, error);
+  std::ifstream file(path, std::ios::binary);
+  const auto read = [&file](auto value) {
+    file.read(reinterpret_cast<char*>(&value), sizeof value);
+    return value;
+  };
+  const auto marker = read(std::int64_t{});
+  const auto first = read(std::int32_t{}), end = read(std::int32_t{});
+  const auto slots = read(std::uint32_t{});
+  return !error && file && marker == kMarker && first == 0 && end >= 0 &&
+         (bytes - kHeaderBytes) / kCellBytes >=
+             std::uintmax_t{slots} * static_cast<std::uintmax_t>(end);
+}
+
 }  // namespace
 
-report::TrackTable SaveTracks(SteadyClip& clip, const std::string& work, const std::string& path,
-                              const std::string& file) {
+void SaveTracks(host::SteadyClip& clip, const std::string& work, const std::string& path,
+                const std::string& file) {
   const auto fail = [&file] {
     throw media::Failure(media::Failure::Side::output, file + ": can't be written whole");
   };
@@ -37,9 +55,7 @@ report::TrackTable SaveTracks(SteadyClip& clip, const std::string& work, const s
   if (std::filesystem::file_size(path, error) == sizeof kMark) {
     throw SolveFailure(work + ": holds no tracks");
   }
-  std::optional<report::TrackTable> tracks = report::ReadTrackFile(path);
-  if (!tracks) fail();
-  return *std::move(tracks);
+  if (!IsWhole(path)) fail();
 }
 
 }  // namespace calmframe

@@ -2,16 +2,15 @@
 
 #include <string>
 
-#include "apps/calmframe/steady_clip.h"
-#include "apps/report/track_table.h"
+#include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
 
-// Writes the clip's tracks to `path` by the effect's own button, which is one for experts. Returns
-// what the file holds, read back, since the button doesn't tell how it went. `work`, `file`: what
+// Writes the clip's tracks to `path` by the effect's own button, which is one for experts. The
+// file is looked at, since the button doesn't tell how it went. `work`, `file`: what
 // the user calls the saved work and the file. Throws SolveFailure where there are no tracks,
 // media::Failure (output) where the file isn't whole.
-report::TrackTable SaveTracks(SteadyClip& clip, const std::string& work, const std::string& path,
-                              const std::string& file);
+void SaveTracks(host::SteadyClip& clip, const std::string& work, const std::string& path,
+                const std::string& file);
 
 }  // namespace calmframe

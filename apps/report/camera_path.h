@@ -4,11 +4,11 @@
 #include <span>
 #include <vector>
 
+#include "host/stabilize/similarity.h"
+
 namespace calmframe::report {
 
-struct Point {
-  double x = 0, y = 0;  // pixels, y down
-};
+using host::Point;  // pixels, y down
 
 // One feature in two frames that follow each other.
 struct Match {

@@ -24,8 +24,8 @@ std::string Percent(double share, int digits) {
   return Short(100 * share, digits) + " %";
 }
 
-void AddPath(const SolvedClip& solved, Page& page) {
-  const std::vector<CameraPlace> before = PathOf(solved.before), after = PathOf(solved.after);
+void AddPath(const SolveFigures& figures, Page& page) {
+  const std::vector<CameraPlace> before = PathOf(figures.before), after = PathOf(figures.after);
   const auto add = [&](const char* id, const char* title, const char* unit, const char* about,
                        double least_span, double CameraPlace::*axis) {
     page.plots.push_back({id,
@@ -48,37 +48,37 @@ void AddPath(const SolvedClip& solved, Page& page) {
       "How close the camera is to what it shows, 1 at first.", 0.02, &CameraPlace::zoom);
 
   const double shake = ShakeOf(before), left = ShakeOf(after);
-  page.facts.push_back({"Shake", Short(shake, 2) + " px/" + solved.row + "² as shot, " +
+  page.facts.push_back({"Shake", Short(shake, 2) + " px/" + figures.row + "² as shot, " +
                                      Short(left, 2) + " steadied"});
   constexpr double kHardly = 0.75;  // of the shake, left
   constexpr double kSeen = 0.3;     // px/frame²; less is a still camera
   if (shake > kSeen && left > kHardly * shake) {
     page.notes.push_back(
         "Hardly steadier than it was shot. Half of its tracks last " +
-        std::to_string(solved.track_life) + " " + solved.row +
+        std::to_string(figures.track_life) + " " + figures.row +
         "s or fewer: where they are short, as in quick pans and blur, or where someone near "
         "moves against the scene, little can be smoothed.");
   }
 }
 
-void AddTracks(const SolvedClip& solved, Page& page) {
+void AddTracks(const SolveFigures& figures, Page& page) {
   page.plots.push_back(
       {"tracks",
-       "Tracks a " + solved.row,
+       "Tracks a " + figures.row,
        "",
-       "Features that are followed, that begin, and that the next " + solved.row + " loses.",
-       {{"begun", Numbers(solved.begun)},
-        {"followed", Numbers(solved.tracked)},
-        {"lost", Numbers(solved.lost)}},
+       "Features that are followed, that begin, and that the next " + figures.row + " loses.",
+       {{"begun", Numbers(figures.begun)},
+        {"followed", Numbers(figures.tracked)},
+        {"lost", Numbers(figures.lost)}},
        10,
        true});
-  std::vector<int> tracked = solved.tracked;
+  std::vector<int> tracked = figures.tracked;
   std::sort(tracked.begin(), tracked.end());
   page.facts.push_back(
-      {"Tracks a " + solved.row, std::to_string(tracked[tracked.size() / 2]) + " on the median, " +
-                                     std::to_string(tracked.front()) + " at the least"});
-  page.facts.push_back({"A track lasts", std::to_string(solved.track_life) + " " + solved.row +
-                                             (solved.track_life == 1 ? "" : "s") +
+      {"Tracks a " + figures.row, std::to_string(tracked[tracked.size() / 2]) + " on the median, " +
+                                      std::to_string(tracked.front()) + " at the least"});
+  page.facts.push_back({"A track lasts", std::to_string(figures.track_life) + " " + figures.row +
+                                             (figures.track_life == 1 ? "" : "s") +
                                              " on the median"});
 }
 
@@ -95,10 +95,10 @@ void AddModels(const std::vector<double>& scores, Page& page) {
   page.facts.push_back({"Warps", ModelsText(scores)});
 }
 
-void AddCrop(const SolvedClip& solved, Page& page) {
-  if (solved.window.empty()) return;
+void AddCrop(const SolveFigures& figures, Page& page) {
+  if (figures.window.empty()) return;
   std::vector<double> x, y;
-  for (const Point& place : solved.window) {
+  for (const Point& place : figures.window) {
     x.push_back(place.x);
     y.push_back(place.y);
   }
@@ -110,21 +110,21 @@ void AddCrop(const SolvedClip& solved, Page& page) {
                         4});
   page.facts.push_back(
       {"Crop window",
-       std::to_string(solved.crop_width) + " x " + std::to_string(solved.crop_height) + ", " +
-           Percent(static_cast<double>(solved.crop_width) / solved.width, 1) + " of the width"});
+       std::to_string(figures.crop_width) + " x " + std::to_string(figures.crop_height) + ", " +
+           Percent(static_cast<double>(figures.crop_width) / figures.width, 1) + " of the width"});
 }
 
 }  // namespace
 
-void AddSolve(const SolvedClip& solved, const std::vector<double>& scores, Page& page) {
-  if (solved.track_life > 0) {
-    AddPath(solved, page);
-    AddTracks(solved, page);
+void AddSolve(const SolveFigures& figures, const std::vector<double>& scores, Page& page) {
+  if (figures.track_life > 0) {
+    AddPath(figures, page);
+    AddTracks(figures, page);
   } else {
     page.notes.push_back("Nothing to track was found: the frames stay as they are.");
   }
   AddModels(scores, page);
-  AddCrop(solved, page);
+  AddCrop(figures, page);
 }
 
 void AddEmptyShares(const std::vector<double>& empty, std::size_t rows, Page& page) {

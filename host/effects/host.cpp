@@ -7,6 +7,7 @@
 
 #include "host/base/operations.h"
 #include "host/effects/interface_tables.h"
+#include "platform/tessel/debug.h"
 #include "platform/tessel/importer.h"
 #include "platform/tessel/threads.h"
 
@@ -15,6 +16,8 @@ namespace {
 
 std::atomic<Host*> active_host{nullptr};
 thread_local int loop_calls = 0;
+
+constexpr char kExperimental[] = "ShowExperimentalEffectParameters";
 
 }  // namespace
 
@@ -26,6 +29,19 @@ Host::LoopCall::~LoopCall() {
   --loop_calls;
 }
 
+Host::ExperimentalParameters::ExperimentalParameters(bool wanted)
+    : sets_(wanted && !tessel::debug::DebugDatabase::GetBool(kExperimental)) {
+  if (!sets_) return;
+  tessel::debug::DebugDatabase::Set(kExperimental, 1);
+  tessel::debug::SetSink([](const std::string&) {});
+}
+
+Host::ExperimentalParameters::~ExperimentalParameters() {
+  if (!sets_) return;
+  tessel::debug::DebugDatabase::Set(kExperimental, 0);
+  tessel::debug::SetSink({});
+}
+
 Host* Host::active() {
   return active_host.load();
 }
@@ -34,7 +50,11 @@ Host::Host(const std::string& library, const HostSettings& settings)
     : Host(PluginLibrary(library), settings) {}
 
 Host::Host(PluginLibrary library, const HostSettings& settings)
-    : settings_(settings), library_(std::move(library)), media_(settings.media), declarations_(1) {
+    : settings_(settings),
+      experimental_(settings.experimental_parameters),
+      library_(std::move(library)),
+      media_(settings.media),
+      declarations_(1) {
   Host* none = nullptr;
   if (!active_host.compare_exchange_strong(none, this)) {
     throw std::logic_error("a process has one host at a time");

@@ -26,6 +26,10 @@ struct HostSettings {
   MediaSettings media;
   std::string project_path;         // UTF-8; empty is legal
   bool keeps_analysis_raw = false;  // plug-ins are asked not to compress what they save
+  // Plug-ins declare their parameters for experts, too; the first host that loads one settles it
+  // for as long as the process keeps the library. The solve's log, which comes with the option, is
+  // shown where the environment asks for it.
+  bool experimental_parameters = false;
 };
 
 // A plug-in in this process, started, and all that it may ask of its host. One at a time in a
@@ -102,7 +106,20 @@ class Host {
   void Start();
   void DeclareParams();
 
+  // Sets the debug option while it lives, where it is wanted and not set.
+  class ExperimentalParameters {
+   public:
+    explicit ExperimentalParameters(bool wanted);
+    ~ExperimentalParameters();
+    ExperimentalParameters(const ExperimentalParameters&) = delete;
+    ExperimentalParameters& operator=(const ExperimentalParameters&) = delete;
+
+   private:
+    const bool sets_;
+  };
+
   const HostSettings settings_;
+  const ExperimentalParameters experimental_;
   PluginLibrary library_;
   MediaServices media_;
   UserInterface user_interface_;

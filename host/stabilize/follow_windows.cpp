@@ -17,25 +17,24 @@ Point Middle(const SolvedClip& clip) {
   return {(clip.width - 1) / 2.0, (clip.height - 1) / 2.0};
 }
 
-// Vertices about the middle of the plane, frame by frame; of the source itself, all at rest.
+// Vertices about the middle of the plane, frame by frame; without warps one grid for all, at rest.
 class Plane {
  public:
-  Plane(const SolvedClip& clip, bool warped) : clip_(clip), vertices_(clip.vertices) {
+  Plane(const SolvedClip& clip, Warps warps)
+      : clip_(clip),
+        vertices_(warps == Warps::solved ? clip.vertices : GridAtRest(clip)),
+        of_frame_(warps == Warps::solved
+                      ? vertices_.size() / static_cast<std::size_t>(clip.frame_count)
+                      : 0) {
     const Point middle = Middle(clip);
-    const std::size_t of_frame = OfFrame();
-    for (std::size_t i = 0; i < vertices_.size(); ++i) {
-      if (!warped) {
-        const std::size_t at = i % of_frame, columns = static_cast<std::size_t>(clip.columns);
-        vertices_[i] = {(clip.width - 1.0) * static_cast<double>(at % columns) / (clip.columns - 1),
-                        (clip.height - 1.0) * static_cast<double>(at / columns) / (clip.rows - 1)};
-      }
-      vertices_[i].x -= middle.x;
-      vertices_[i].y -= middle.y;
+    for (Point& vertex : vertices_) {
+      vertex.x -= middle.x;
+      vertex.y -= middle.y;
     }
   }
 
   WarpView Warp(std::size_t frame) const {
-    return {vertices_.data() + frame * OfFrame(), clip_.columns, clip_.rows};
+    return {vertices_.data() + frame * of_frame_, clip_.columns, clip_.rows};
   }
 
   // Of a place in the source, in its own pixels; inside of a cell the vertices' bilinear mean.
@@ -88,12 +87,9 @@ class Plane {
   }
 
  private:
-  std::size_t OfFrame() const {
-    return static_cast<std::size_t>(clip_.columns) * static_cast<std::size_t>(clip_.rows);
-  }
-
   const SolvedClip& clip_;
   std::vector<Point> vertices_;
+  std::size_t of_frame_;  // from a frame's to the next one's
 };
 
 // Between coordinates about the middle and about the top left pixel.
@@ -105,7 +101,7 @@ Similarity Moved(const Similarity& of, Point by) {
 }  // namespace
 
 Background FindBackground(const SolvedClip& clip) {
-  const Plane source(clip, false), plane(clip, true);
+  const Plane source(clip, Warps::none), plane(clip, Warps::solved);
   const auto frames = static_cast<std::size_t>(clip.frame_count);
   Background found{std::vector<Similarity>(frames), std::vector<Similarity>(frames)};
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
@@ -119,7 +115,7 @@ Background FindBackground(const SolvedClip& clip) {
 
 std::vector<Similarity> FollowWindows(const SolvedClip& clip, const Background& background,
                                       const FollowSettings& settings) {
-  const Plane source(clip, false), plane(clip, true);
+  const Plane source(clip, Warps::none), plane(clip, Warps::solved);
   std::vector<WindowFrame> frames(static_cast<std::size_t>(clip.frame_count));
   for (std::size_t f = 0; f < frames.size(); ++f) {
     WindowFrame& frame = frames[f];
@@ -158,7 +154,7 @@ std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom) {
 
 ShownMotion MotionShown(const SolvedClip& clip, const Background& background,
                         const std::vector<Similarity>& windows) {
-  const Plane plane(clip, true);
+  const Plane plane(clip, Warps::solved);
   const Point middle = Middle(clip);
   ShownMotion shown;
   shown.width = clip.width;

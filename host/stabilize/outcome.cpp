@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
+#include <nlohmann/json.hpp>
 
 namespace calmframe::host {
 
@@ -26,6 +27,22 @@ std::string Outcome::Text() const {
                 decibels() < 0 ? "more" : "less", after.worst, seconds / 60, seconds % 60,
                 bends ? "" : "; no frame is bent");
   return text;
+}
+
+nlohmann::ordered_json Outcome::Json() const {
+  const auto rounded = [](double value) { return std::round(value * 10000) / 10000; };
+  nlohmann::ordered_json object;
+  object["window"] = follows ? "follow" : "steady";
+  object["bends"] = bends;
+  object["width_kept"] = rounded(width_kept);
+  object["most_zoom"] = rounded(most_zoom);
+  object["most_black"] = rounded(most_black);
+  object["shake_before"] = rounded(before.mean);
+  object["shake_after"] = rounded(after.mean);
+  object["decibels"] = rounded(decibels());
+  object["worst_shake"] = rounded(after.worst);
+  object["worst_at"] = rounded(after.worst_at);
+  return object;
 }
 
 Outcome MeasureOutcome(const SolvedClip& clip, const Background& background,

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <nlohmann/json_fwd.hpp>
 #include <string>
 
 #include "host/stabilize/follow_windows.h"
@@ -19,6 +20,9 @@ struct Outcome {
   double decibels() const;
   // In one line: "85 % of the width kept, ...".
   std::string Text() const;
+  // For programs, an object with all that the line tells and what was chosen: names as above,
+  // numbers to four places.
+  nlohmann::ordered_json Json() const;
 };
 
 // `windows`: see MotionShown.

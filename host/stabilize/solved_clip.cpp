@@ -325,13 +325,15 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
   return InstanceOf(payload.bytes);
 }
 
-SolvedClip WithoutWarps(SolvedClip clip) {
+std::vector<Point> GridAtRest(const SolvedClip& clip) {
   Grid grid(static_cast<std::size_t>(clip.columns), static_cast<std::size_t>(clip.rows));
   grid.Rest(clip.width, clip.height);
-  for (std::size_t at = 0; at < clip.vertices.size(); at += grid.vertices().size()) {
-    std::copy(grid.vertices().begin(), grid.vertices().end(),
-              clip.vertices.begin() + static_cast<std::ptrdiff_t>(at));
-  }
+  return grid.vertices();
+}
+
+SolvedClip WithoutWarps(SolvedClip clip) {
+  const std::vector<Point> rest = GridAtRest(clip);
+  for (std::size_t i = 0; i < clip.vertices.size(); ++i) clip.vertices[i] = rest[i % rest.size()];
   return clip;
 }
 

@@ -62,6 +62,9 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance);
 // A frame's warp as it was solved, or none: then the stabilized plane is the source itself.
 enum class Warps { solved, none };
 
+// Where a frame's vertices stand in the source, by row, column.
+std::vector<Point> GridAtRest(const SolvedClip& clip);
+
 // The clip with all vertices at rest.
 SolvedClip WithoutWarps(SolvedClip clip);
 

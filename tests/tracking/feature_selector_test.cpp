@@ -40,8 +40,11 @@ Image RandomImage(int width, int height, unsigned seed, bool in_steps = false) {
   const int step = in_steps ? 32 : 1;
   Image image(width, height, 96.0f);
   for (int i = 0; i < width * height / 60; ++i) {
+    // One draw after the other: the order of arguments is the compiler's, and the picture is not.
     const int x = random() % width, y = random() % height;
-    image.Fill(x, y, x + 2 + random() % 14, y + 2 + random() % 14, random() % 256 / step * step);
+    const int value = random() % 256 / step * step;
+    const int bottom = y + 2 + random() % 14, right = x + 2 + random() % 14;
+    image.Fill(x, y, right, bottom, value);
   }
   for (float& v : image.luma) v = std::min<float>(255, v + (in_steps ? 0 : random() % 6));
   for (auto& m : image.mask) m = random() % 8 != 0;

@@ -6,17 +6,16 @@
 #include <string>
 #include <vector>
 
-#include "apps/calmframe/controls.h"
-#include "apps/calmframe/progress_line.h"
-#include "apps/calmframe/stretch.h"
 #include "host/effects/host.h"
+#include "host/effects/param_table.h"
 #include "host/effects/session.h"
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
 #include "host/stabilize/choice.h"
+#include "host/stabilize/watcher.h"
 #include "host/timeline/source.h"
 
-namespace calmframe {
+namespace calmframe::host {
 
 // The crop window that the effect found for a clip, in square pixels of its frames.
 struct CropWindow {
@@ -35,17 +34,22 @@ struct Reuse {
 // container promises of them, while the analysis is the first to decode them.
 enum class Opening { decoded, promised };
 
-// A clip on the timeline of a host, with the effect applied to it. For the thread that made it.
+// A clip on the timeline of a host, with the effect applied to it: opened, worked, framed, measured
+// and saved. For the thread that made it; one at a time in a process, as its host is.
 class SteadyClip {
  public:
-  // A clip of which nothing is done yet, or a stretch of one; or the saved work of one, with its
-  // own stretch, its controls changed where flags say so. Throws media::Failure, UsageFailure, and
-  // SolveFailure when the effect can't be had.
-  SteadyClip(const std::string& path, const ControlFlags& controls,
-             Opening opening = Opening::decoded, const Stretch& stretch = {});
-  SteadyClip(const host::Project& project, const std::string& path, const ControlFlags& controls);
+  // `plugin`: the effect's library. A clip of which nothing is done yet, or with a `part` these
+  // frames of it alone; or the saved work of one, with its own part. Throws media::Failure,
+  // SolveFailure when the effect can't be had, and what `part` throws.
+  SteadyClip(const std::string& plugin, const std::string& path, Opening opening = Opening::decoded,
+             const media::ClipReader::Part& part = {});
+  SteadyClip(const std::string& plugin, const Project& project, const std::string& path);
   // The saved work of a clip that is gone: what was made of it stands, its frames are blank.
-  SteadyClip(const host::Project& project, const ControlFlags& controls);
+  SteadyClip(const std::string& plugin, const Project& project);
+
+  // Sets these of the effect's parameters; host().declarations() has them all. What they ask for is
+  // there after the next Work. Throws SolveFailure.
+  void SetControls(const ParamValues& values);
 
   const std::string& path() const { return info_.path; }
   // As a clip of its own: a part, where only a stretch of it is worked.
@@ -53,32 +57,36 @@ class SteadyClip {
   const media::ClipInfo& whole() const { return whole_; }
   // What is worked, in frames of the whole clip.
   const media::FrameRange& range() const { return range_; }
-  host::Host& host() { return host_; }
-  bool has_new_controls() const { return !values_.empty(); }
-  host::Effect& effect() { return *effect_; }
+  Host& host() { return host_; }
+  // Since it was opened.
+  bool has_new_controls() const { return has_new_controls_; }
+  Effect& effect() { return *effect_; }
   // What draws the frames: the effect, or where windows follow the picture one that shows these.
-  host::Effect& drawn() { return drawn_ ? *drawn_ : *effect_; }
+  Effect& drawn() { return drawn_ ? *drawn_ : *effect_; }
 
-  // Waits until the effect has analysed and solved the clip, as far as that is to do. Throws
-  // Interrupted, SolveFailure, media::Failure; the last also where a clip that is gone would have
-  // to be analysed; BrokenPromise of a clip that was opened by promises, before anything is told of
-  // how the work ended.
-  Reuse Work(ProgressLine& progress);
+  // Waits until the effect has analysed and solved the clip, as far as that is to do; from then on
+  // it draws by itself, and no renderer of another one may be left. Once stopped it goes on where
+  // it was. Throws Interrupted, SolveFailure, media::Failure; the last also where a clip that is
+  // gone would have to be analysed; BrokenPromise of a clip that was opened by promises, before
+  // anything is told of how the work ended.
+  Reuse Work(Watcher& watcher);
 
   // Solves once more with the controls as they stand, for what only a running solve tells. Throws
   // as Work.
-  void SolveAnew(ProgressLine& progress);
+  void SolveAnew(Watcher& watcher);
 
   // After Work, with a framing that crops: from now on what is drawn are the calmest windows that
   // stay in the picture, enlarged at most so far, in place of the effect's own crop window; and
   // where that is calmer, the frames as they were shot. What is saved stays as it was. Throws
-  // SolveFailure.
-  void FollowPicture(double most_zoom);
+  // Interrupted, SolveFailure.
+  void FollowPicture(double most_zoom, Watcher& watcher);
   // After Work, with a framing that crops: what the output shows.
-  host::Outcome Measure();
+  Outcome Measure();
 
   // Throws SolveFailure where the effect can't be saved.
-  host::Project Saved();
+  Project Saved();
+  // After Work: what is solved, as it would be saved. Throws SolveFailure.
+  SolvedClip Solved();
 
   // After Work. Null where the framing has none.
   std::unique_ptr<CropWindow> Crop();
@@ -95,32 +103,37 @@ class SteadyClip {
  private:
   struct Medium {
     media::ClipInfo info;
-    host::SourcePtr source;
+    SourcePtr source;
     std::shared_ptr<const media::FoundFrames> found;  // null: a stand-in for one that is gone
   };
   static Medium Open(const std::string& path, std::unique_ptr<media::ClipReader> reader);
-  static Medium Blank(const host::Project& project);
-  SteadyClip(const Medium& medium, const ControlFlags& controls, const Stretch& stretch);
-  SteadyClip(const host::Project& project, const Medium& medium, const ControlFlags& controls);
-  SteadyClip(const host::Project* project, const Medium& medium, const media::FrameRange& range,
-             const ControlFlags& controls);
+  static Medium Blank(const Project& project);
+  SteadyClip(const std::string& plugin, const Medium& medium, const media::ClipReader::Part& part);
+  SteadyClip(const std::string& plugin, const Project& project, const Medium& medium);
+  SteadyClip(const std::string& plugin, const Project* project, const Medium& medium,
+             const media::FrameRange& range);
   bool IsBroken() const;
+  Reuse WorkFramedLast(double framing, Watcher& watcher);
+  // act(the parameter's value); what act throws leaves it with that value.
+  template <class Act>
+  auto Keeping(std::int32_t disk_id, const Act& act);
   // Ticks until nothing is left to do. What was seen at work is taken from `reuse`. `shown`: the
   // stage that was shown last and goes on until another one begins or End ends it.
-  void Settle(ProgressLine& progress, Progress& shown, Reuse& reuse);
-  static void End(ProgressLine& progress, Progress& shown);
+  void Settle(Watcher& watcher, Progress& shown, Reuse& reuse);
+  static void End(Watcher& watcher, Progress& shown);
   // The effect goes on from what it would save, which is rounded: so a clip looks the same whether
   // its work went through a project or not. Throws SolveFailure.
   void TakeAsSaved();
   // Of a parameter, as it was declared. Throws SolveFailure.
   void Set(std::int32_t disk_id, double value);
   // What the effect would save, and what of it is solved. Throws SolveFailure.
-  host::SolvedClip Solved(host::SavedEffect* saved);
+  SolvedClip Solved(SavedEffect* saved);
+  void DrawByItself();
   double FramesPerSecond() const;  // fields, of an interlaced clip
   // At which the effect shows its crop window.
-  double Zoom(const host::SolvedClip& solved) const;
+  double Zoom(const SolvedClip& solved) const;
   // Throws SolveFailure where the effect is not ready.
-  void CheckResult(ProgressLine& progress);
+  void CheckResult(Watcher& watcher);
   // Address of the first frame's warp, which goes with its solve; null without one.
   const void* FirstWarp();
 
@@ -128,12 +141,13 @@ class SteadyClip {
   const media::FrameRange range_;
   const media::ClipInfo info_;
   const std::shared_ptr<const media::FoundFrames> found_;  // null of a stand-in
-  host::Host host_;
-  const std::map<std::int32_t, double> values_;
-  host::Session session_;
-  host::Effect* effect_ = nullptr;  // the session's
-  host::Effect* drawn_ = nullptr;   // the session's; null: the effect itself
-  host::Outcome outcome_;           // of drawn_
+  Host host_;
+  Session session_;
+  Effect* effect_ = nullptr;  // the session's
+  Effect* drawn_ = nullptr;   // the session's; null: the effect itself
+  Outcome outcome_;           // of drawn_
+  bool has_new_controls_ = false;
+  bool analysed_ = false;  // anew, and what is solved of it is still to begin
 };
 
-}  // namespace calmframe
+}  // namespace calmframe::host

@@ -1,4 +1,4 @@
-#include "apps/calmframe/steady_clip.h"
+#include "host/stabilize/steady_clip.h"
 
 #include <malloc.h>
 
@@ -10,12 +10,11 @@
 #include <numeric>
 #include <utility>
 
-#include "apps/calmframe/failures.h"
-#include "apps/calmframe/plugin_path.h"
-#include "host/effects/param_table.h"
+#include "host/stabilize/control_items.h"
+#include "host/stabilize/failures.h"
 #include "platform/hx/hx_controls.h"
 
-namespace calmframe {
+namespace calmframe::host {
 namespace {
 
 // Disk ids of the effect's parameters.
@@ -47,9 +46,9 @@ media::FieldOrder OrderOf(std::int32_t field_type) {
   }
 }
 
-host::HostSettings SettingsFor(const media::ClipInfo& info) {
-  DeclareExperimentalParameters();
-  host::HostSettings settings;
+HostSettings SettingsFor(const media::ClipInfo& info) {
+  HostSettings settings;
+  settings.experimental_parameters = true;  // some of them are set below
   // A walk from the first frame to the last needs what is ahead of it and little more.
   constexpr std::size_t kFrames = 6;
   settings.media.cache_bytes =
@@ -58,7 +57,7 @@ host::HostSettings SettingsFor(const media::ClipInfo& info) {
 }
 
 // Frames that an analysis of the layer asks its host for; of an interlaced one each field.
-double FramesToAnalyse(const host::LayerState& layer) {
+double FramesToAnalyse(const LayerState& layer) {
   return layer.length * (layer.field_type == HX_FIELD_PROGRESSIVE ? 1.0 : 2.0);
 }
 
@@ -74,19 +73,30 @@ std::string FailureText(int status, const std::vector<std::string>& messages) {
   }
 }
 
-media::ClipReader::Part PartFor(const Stretch& stretch) {
-  if (!stretch.is_given()) return {};
-  return [stretch](const media::ClipInfo& clip) { return FramesOf(stretch, clip); };
-}
-
 // A layer may reach beyond its clip.
-media::FrameRange RangeOf(const host::Project& project, const media::ClipInfo& clip) {
+media::FrameRange RangeOf(const Project& project, const media::ClipInfo& clip) {
   const auto count = static_cast<std::int64_t>(clip.frame_count);
   const std::int64_t first = std::clamp<std::int64_t>(project.start_frame, 0, count - 1);
   const std::int64_t end = std::clamp<std::int64_t>(
       std::int64_t{project.start_frame} + project.length, first + 1, count);
   return {static_cast<std::size_t>(first), static_cast<std::size_t>(end)};
 }
+
+media::FrameRange RangeOf(const media::ClipReader::Part& part, const media::ClipInfo& clip) {
+  return part ? part(clip) : media::FrameRange{0, clip.frame_count};
+}
+
+// Shows nothing to a watcher who may stop the work all the same.
+class Unseen final : public Watcher {
+ public:
+  explicit Unseen(Watcher& watcher) : watcher_(watcher) {}
+  void Show(const Progress&) override {}
+  void Warn(const std::string&) override {}
+  bool Stops() override { return watcher_.Stops(); }
+
+ private:
+  Watcher& watcher_;
+};
 
 }  // namespace
 
@@ -106,11 +116,11 @@ SteadyClip::Medium SteadyClip::Open(const std::string& path,
                                                           " pixels are too few to stabilize");
   }
   const std::shared_ptr<const media::FoundFrames> frames = reader->found();
-  return {info, host::OpenClip(std::move(reader)), frames};
+  return {info, OpenClip(std::move(reader)), frames};
 }
 
-SteadyClip::Medium SteadyClip::Blank(const host::Project& project) {
-  host::SourceInfo source;
+SteadyClip::Medium SteadyClip::Blank(const Project& project) {
+  SourceInfo source;
   source.width = std::max(project.width, 1);
   source.height = std::max(project.height, 1);
   source.pixel_aspect = project.pixel_aspect;
@@ -127,45 +137,43 @@ SteadyClip::Medium SteadyClip::Blank(const host::Project& project) {
   info.frame_rate = {HX_TICKS_PER_SECOND / divisor, project.ticks_per_frame / divisor};
   info.frame_count = static_cast<std::size_t>(std::max<std::int64_t>(source.frame_count, 0));
   info.field_order = OrderOf(project.field_type);
-  const auto draw = [](std::int64_t, host::Picture& picture) {
+  const auto draw = [](std::int64_t, Picture& picture) {
     std::memset(picture.memory(), 0xff, picture.bytes());
   };
-  return {info, host::MakeDrawnSource(source, draw), nullptr};
+  return {info, MakeDrawnSource(source, draw), nullptr};
 }
 
-SteadyClip::SteadyClip(const std::string& path, const ControlFlags& controls, Opening opening,
-                       const Stretch& stretch)
-    : SteadyClip(Open(path, opening == Opening::promised
-                                ? media::ClipReader::OpenPromised(path, PartFor(stretch))
-                                : media::ClipReader::Open(path)),
-                 controls, stretch) {}
+SteadyClip::SteadyClip(const std::string& plugin, const std::string& path, Opening opening,
+                       const media::ClipReader::Part& part)
+    : SteadyClip(
+          plugin,
+          Open(path, opening == Opening::promised ? media::ClipReader::OpenPromised(path, part)
+                                                  : media::ClipReader::Open(path)),
+          part) {}
 
-SteadyClip::SteadyClip(const Medium& medium, const ControlFlags& controls, const Stretch& stretch)
-    : SteadyClip(nullptr, medium, FramesOf(stretch, medium.info), controls) {}
+SteadyClip::SteadyClip(const std::string& plugin, const Medium& medium,
+                       const media::ClipReader::Part& part)
+    : SteadyClip(plugin, nullptr, medium, RangeOf(part, medium.info)) {}
 
-SteadyClip::SteadyClip(const host::Project& project, const Medium& medium,
-                       const ControlFlags& controls)
-    : SteadyClip(&project, medium, RangeOf(project, medium.info), controls) {}
+SteadyClip::SteadyClip(const std::string& plugin, const Project& project, const Medium& medium)
+    : SteadyClip(plugin, &project, medium, RangeOf(project, medium.info)) {}
 
-SteadyClip::SteadyClip(const host::Project& project, const std::string& path,
-                       const ControlFlags& controls)
-    : SteadyClip(project, Open(path, media::ClipReader::Open(path, project.clip_frames)),
-                 controls) {}
+SteadyClip::SteadyClip(const std::string& plugin, const Project& project, const std::string& path)
+    : SteadyClip(plugin, project, Open(path, media::ClipReader::Open(path, project.clip_frames))) {}
 
-SteadyClip::SteadyClip(const host::Project& project, const ControlFlags& controls)
-    : SteadyClip(project, Blank(project), controls) {}
+SteadyClip::SteadyClip(const std::string& plugin, const Project& project)
+    : SteadyClip(plugin, project, Blank(project)) {}
 
-SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
-                       const media::FrameRange& range, const ControlFlags& controls) try
+SteadyClip::SteadyClip(const std::string& plugin, const Project* project, const Medium& medium,
+                       const media::FrameRange& range) try
     : whole_(medium.info),
       range_(range),
       info_(media::PartOf(whole_, range_)),
       found_(medium.found),
-      host_(PluginPath(), SettingsFor(info_)),
-      values_(ResolveControls(controls, host_.declarations())),
+      host_(plugin, SettingsFor(info_)),
       session_(host_) {
-  const auto layer = boost::make_shared<host::Layer>(medium.source);
-  layer->Change([&](host::LayerState& state) {
+  const auto layer = boost::make_shared<Layer>(medium.source);
+  layer->Change([&](LayerState& state) {
     state.name = state.file_name = path();
     state.start_frame = project ? project->start_frame : static_cast<std::int32_t>(range_.first);
     state.length = project ? project->length : static_cast<std::int32_t>(range_.size());
@@ -177,36 +185,40 @@ SteadyClip::SteadyClip(const host::Project* project, const Medium& medium,
   if (!effect_->creation().ok()) throw SolveFailure(effect_->creation().Line(path()));
   // Saved work keeps what it was made with.
   if (!project) Set(HX_TRANSITION_BISQUARE_SIGMA.disk_id, kTransitionBisquareSigma);
-  for (const auto& [disk_id, value] : values_) Set(disk_id, value);
-} catch (const host::PluginError& error) {
+} catch (const PluginError& error) {
   throw SolveFailure(error.what());
 }
 
+void SteadyClip::SetControls(const ParamValues& values) {
+  for (const auto& [disk_id, value] : values) Set(disk_id, value);
+  has_new_controls_ = has_new_controls_ || !values.empty();
+}
+
 void SteadyClip::TakeAsSaved() {
-  host::SavedEffect saved;
-  const host::CommandResult result = effect_->Save(&saved);
+  SavedEffect saved;
+  const CommandResult result = effect_->Save(&saved);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
 }
 
-void SteadyClip::Settle(ProgressLine& progress, Progress& shown, Reuse& reuse) {
-  using Work = host::Session::Work;
+void SteadyClip::Settle(Watcher& watcher, Progress& shown, Reuse& reuse) {
+  using Work = Session::Work;
   // By the analysis, which alone asks for frames here, and may be at work when it is first seen.
   const std::uint64_t delivered_before = host_.media().counts().delivered;
-  bool analysed = false, has_new_tracks = false;
+  bool has_new_tracks = false;
   const auto show = [&] {
-    const Work work = host::Session::WorkOf(*effect_);
+    const Work work = Session::WorkOf(*effect_);
     const std::uint64_t delivered = host_.media().counts().delivered;
     if (IsBroken()) return true;  // in this order: what it ends for that reason is not told
     const std::string stage = work == Work::analysing ? "analyzing"
                               : work == Work::solving ? "solving"
                                                       : "";
-    if (stage.empty()) return InterruptAsked();
-    if (stage != shown.stage) End(progress, shown);
+    if (stage.empty()) return watcher.Stops();
+    if (stage != shown.stage) End(watcher, shown);
     reuse.framing = false;
     if (work == Work::analysing) {
       reuse.analysis = false;
-      analysed = true;
-    } else if (std::exchange(analysed, false)) {
+      analysed_ = true;
+    } else if (analysed_) {
       has_new_tracks = true;
       return true;
     }
@@ -221,45 +233,62 @@ void SteadyClip::Settle(ProgressLine& progress, Progress& shown, Reuse& reuse) {
     shown.says = NameOf(work == Work::analysing ? kCancelButton : kStabilizationGroup);
     // Nothing is done yet, whatever it says by now; or it says its bare name.
     if (begins || shown.says.find('(') == std::string::npos) shown.says.clear();
-    progress.Show(shown);
-    return InterruptAsked();
+    watcher.Show(shown);
+    return watcher.Stops();
   };
   while (true) {
     const auto waited = session_.TickUntilSettled(std::chrono::hours(24 * 30), show);
     if (IsBroken()) throw BrokenPromise();
-    if (InterruptAsked()) throw Interrupted();
+    if (watcher.Stops()) throw Interrupted();
     if (!std::exchange(has_new_tracks, false)) {
-      if (waited != host::Session::Wait::settled) throw Interrupted();
+      if (waited != Session::Wait::settled) throw Interrupted();
       break;
     }
     TakeAsSaved();  // ahead of what is solved of them
+    analysed_ = false;
   }
   // The render that follows has its own pattern of buffers: what the analysis took goes back.
   malloc_trim(0);
 }
 
-void SteadyClip::End(ProgressLine& progress, Progress& shown) {
+void SteadyClip::End(Watcher& watcher, Progress& shown) {
   if (!shown.stage.empty()) {
     shown.ends = true;
     shown.done = shown.total;
-    progress.Show(shown);
+    watcher.Show(shown);
   }
   shown = {};
 }
 
 void SteadyClip::Set(std::int32_t disk_id, double value) {
-  const host::CommandResult result = effect_->SetParam(effect_->IndexOf(disk_id), value);
+  const CommandResult result = effect_->SetParam(effect_->IndexOf(disk_id), value);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
 }
 
-Reuse SteadyClip::Work(ProgressLine& progress) {
+template <class Act>
+auto SteadyClip::Keeping(std::int32_t disk_id, const Act& act) {
+  const double value = ValueOf(disk_id);
+  try {
+    return act(value);
+  } catch (...) {
+    effect_->SetParam(effect_->IndexOf(disk_id), value);
+    throw;
+  }
+}
+
+Reuse SteadyClip::Work(Watcher& watcher) {
+  DrawByItself();
+  return Keeping(HX_FRAMING.disk_id,
+                 [&](double framing) { return WorkFramedLast(framing, watcher); });
+}
+
+Reuse SteadyClip::WorkFramedLast(double framing, Watcher& watcher) {
   Reuse reuse{true, true, true};
   Progress shown;
   const void* const warp = FirstWarp();
   // The crop window is to be that of the warps as they are saved, so it comes behind them.
-  const double framing = ValueOf(HX_FRAMING.disk_id);
   if (Crops(framing)) Set(HX_FRAMING.disk_id, kStabilizeOnly);
-  Settle(progress, shown, reuse);
+  Settle(watcher, shown, reuse);
   // Saved work of another span, of other settings, or of none is not begun anew by itself.
   const std::int32_t analyze = effect_->IndexOf(kAnalyzeButton);
   if (const auto button = effect_->Param(analyze);
@@ -269,74 +298,80 @@ Reuse SteadyClip::Work(ProgressLine& progress) {
                            path() + ": is gone, and what was made of it doesn't stand any more");
     }
     reuse = {};
-    const host::CommandResult pressed = effect_->Press(analyze);
+    const CommandResult pressed = effect_->Press(analyze);
     if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
-    Settle(progress, shown, reuse);
+    Settle(watcher, shown, reuse);
   }
   // An analysis that ended early has not seen all that was promised.
   if (found_ && found_->standing() != media::Standing::decoded) throw BrokenPromise();
   reuse.solve = reuse.analysis && warp && warp == FirstWarp();
   if (!reuse.solve && FirstWarp()) TakeAsSaved();
-  if (Crops(framing) && host::Session::StatusOf(*effect_) == kReady) {
+  if (Crops(framing) && Session::StatusOf(*effect_) == kReady) {
     Set(HX_FRAMING.disk_id, framing);
-    Settle(progress, shown, reuse);
+    Settle(watcher, shown, reuse);
   }
-  End(progress, shown);
+  End(watcher, shown);
   reuse.framing = reuse.framing && reuse.solve;
-  CheckResult(progress);
+  CheckResult(watcher);
   return reuse;
 }
 
-void SteadyClip::CheckResult(ProgressLine& progress) {
+void SteadyClip::CheckResult(Watcher& watcher) {
   CheckMedia();
   const std::vector<std::string> messages = effect_->TakeMessages();
-  const int status = host::Session::StatusOf(*effect_);
+  const int status = Session::StatusOf(*effect_);
   if (status != kReady) throw SolveFailure(path() + ": " + FailureText(status, messages));
-  for (const std::string& message : messages) progress.Warn(message);
+  for (const std::string& message : messages) watcher.Warn(message);
 }
 
-void SteadyClip::SolveAnew(ProgressLine& progress) {
-  const std::int32_t method = effect_->IndexOf(kMethod);
-  const double value = ValueOf(kMethod);
-  // A method that is quick to solve for, without a word; with the first one again, nothing of it
-  // stands.
-  ProgressLine nothing(ProgressLine::Form::none);
+void SteadyClip::SolveAnew(Watcher& watcher) {
   Progress shown;
   Reuse ignored;
-  effect_->SetParam(method, value == 1 ? 2.0 : 1.0);
-  Settle(nothing, shown, ignored);
-  shown = {};
-  effect_->SetParam(method, value);
-  Settle(progress, shown, ignored);
-  End(progress, shown);
-  CheckResult(progress);
+  Keeping(kMethod, [&](double value) {
+    const std::int32_t method = effect_->IndexOf(kMethod);
+    // A method that is quick to solve for, without a word; with the first one again, nothing of it
+    // stands.
+    Unseen unseen(watcher);
+    effect_->SetParam(method, value == 1 ? 2.0 : 1.0);
+    Settle(unseen, shown, ignored);
+    shown = {};
+    effect_->SetParam(method, value);
+  });
+  Settle(watcher, shown, ignored);
+  End(watcher, shown);
+  CheckResult(watcher);
 }
 
-host::SolvedClip SteadyClip::Solved(host::SavedEffect* saved) {
-  const host::CommandResult result = effect_->Save(saved);
+SolvedClip SteadyClip::Solved() {
+  SavedEffect ignored;
+  return Solved(&ignored);
+}
+
+SolvedClip SteadyClip::Solved(SavedEffect* saved) {
+  const CommandResult result = effect_->Save(saved);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
   try {
-    return host::ReadSolvedClip(saved->instance);
-  } catch (const host::NoSolvedClip& failure) {
+    return ReadSolvedClip(saved->instance);
+  } catch (const NoSolvedClip& failure) {
     throw SolveFailure(path() + ": " + failure.what());
   }
 }
 
-void SteadyClip::FollowPicture(double most_zoom) {
-  host::SavedEffect saved;
-  const host::SolvedClip solved = Solved(&saved);
-  host::FollowSettings settings;
+void SteadyClip::FollowPicture(double most_zoom, Watcher& watcher) {
+  SavedEffect saved;
+  const SolvedClip solved = Solved(&saved);
+  FollowSettings settings;
   settings.most_zoom = most_zoom;
   settings.enlarged = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
   // Whoever asks for a method has its warps; deblurring goes by theirs, too.
   const bool may_leave_warps = ValueOf(kMethod) == HX_METHOD.default_item && ValueOf(kDeblur) == 0;
-  const host::Choice choice = host::Choose(solved, settings, FramesPerSecond(), may_leave_warps);
+  const Choice choice = Choose(solved, settings, FramesPerSecond(), may_leave_warps);
   outcome_ = choice.outcome;
-  saved.instance = host::WithWindows(saved.instance, choice.windows, choice.warps);
+  saved.instance = WithWindows(saved.instance, choice.windows, choice.warps);
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
   const auto state = effect_->shared()->layer()->state();
-  const auto layer = boost::make_shared<host::Layer>(state->source);
-  layer->Change([&](host::LayerState& copy) {
+  const auto layer = boost::make_shared<Layer>(state->source);
+  layer->Change([&](LayerState& copy) {
     copy.name = state->name;
     copy.file_name = state->file_name;
     copy.start_frame = state->start_frame;
@@ -344,20 +379,25 @@ void SteadyClip::FollowPicture(double most_zoom) {
     copy.ticks_per_frame = state->ticks_per_frame;
     copy.field_type = state->field_type;
   });
+  DrawByItself();
   drawn_ = &session_.Load(layer, saved);
-  session_.TickUntilSettled(std::chrono::hours(24), InterruptAsked);
-  if (InterruptAsked()) throw Interrupted();
-  const int status = host::Session::StatusOf(*drawn_);
+  session_.TickUntilSettled(std::chrono::hours(24), [&] { return watcher.Stops(); });
+  if (watcher.Stops()) throw Interrupted();
+  const int status = Session::StatusOf(*drawn_);
   if (status != kReady) throw SolveFailure(path() + ": " + FailureText(status, {}));
 }
 
-host::Outcome SteadyClip::Measure() {
+void SteadyClip::DrawByItself() {
+  if (drawn_) session_.Remove(*drawn_);
+  drawn_ = nullptr;
+}
+
+Outcome SteadyClip::Measure() {
   if (drawn_) return outcome_;
-  host::SavedEffect saved;
-  const host::SolvedClip solved = Solved(&saved);
+  const SolvedClip solved = Solved();
   const double zoom = Zoom(solved);
-  host::Outcome outcome = host::MeasureOutcome(solved, host::FindBackground(solved),
-                                               host::OwnWindows(solved, zoom), FramesPerSecond());
+  Outcome outcome =
+      MeasureOutcome(solved, FindBackground(solved), OwnWindows(solved, zoom), FramesPerSecond());
   if (solved.crop) {  // the effect draws the window alone, which a maximum scale leaves small
     const double across = std::min(1.0, zoom * solved.crop->width / solved.width);
     const double down = std::min(1.0, zoom * solved.crop->height / solved.height);
@@ -371,7 +411,7 @@ double SteadyClip::FramesPerSecond() const {
          (info_.field_order == media::FieldOrder::progressive ? 1 : 2);
 }
 
-double SteadyClip::Zoom(const host::SolvedClip& solved) const {
+double SteadyClip::Zoom(const SolvedClip& solved) const {
   const double additional = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
   if (ValueOf(HX_FRAMING.disk_id) != kCropAutoScale || !solved.crop) return additional;
   const double rest = 1 - ValueOf(HX_ACTION_SAFE_MARGIN.disk_id) / 100;
@@ -380,9 +420,9 @@ double SteadyClip::Zoom(const host::SolvedClip& solved) const {
   return additional * std::max(1.0, std::min(fills, ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100));
 }
 
-host::Project SteadyClip::Saved() {
-  host::Project project;
-  const host::CommandResult saved = effect_->Save(&project.effect);
+Project SteadyClip::Saved() {
+  Project project;
+  const CommandResult saved = effect_->Save(&project.effect);
   if (!saved.ok()) throw SolveFailure(saved.Line(path()));
   const auto layer = effect_->shared()->layer()->state();
   project.clip_path = path();
@@ -455,4 +495,4 @@ void SteadyClip::CheckMedia() {
   if (!failure.empty()) throw media::Failure(media::Failure::Side::input, failure);
 }
 
-}  // namespace calmframe
+}  // namespace calmframe::host

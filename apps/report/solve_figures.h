@@ -6,13 +6,12 @@
 #include <vector>
 
 #include "apps/report/camera_path.h"
-#include "apps/report/track_table.h"
-#include "host/plugin/plugin_library.h"
+#include "host/stabilize/solved_clip.h"
 
 namespace calmframe::report {
 
 // What a clip's tracks and warps tell, a row a frame, or a field where the clip is interlaced.
-struct SolvedClip {
+struct SolveFigures {
   std::string row = "frame";  // what one is
   // Motions from a row to the next: of the picture as shot, and as warped.
   std::vector<std::optional<FrameMotion>> before, after;
@@ -24,9 +23,7 @@ struct SolvedClip {
   int width = 0, height = 0;            // of a frame in square pixels
 };
 
-// `block`: the effect's opaque data. pixel_aspect: width : height of one of the clip's. Null
-// without a solve.
-std::optional<SolvedClip> ReadSolve(const host::PluginExports& exports, const void* block,
-                                    const TrackTable& tracks, double pixel_aspect);
+// `clip`: its tracks may be none, its vertices any numbers.
+SolveFigures FiguresOf(const host::SolvedClip& clip);
 
 }  // namespace calmframe::report

@@ -1,0 +1,12 @@
+#pragma once
+
+namespace calmframe::host {
+
+// Items of HX_FRAMING, and of HX_RESULT.
+inline constexpr double kStabilizeOnly = 1, kCrop = 2, kCropAutoScale = 3, kSynthesizeEdges = 4;
+inline constexpr double kSmoothMotion = 1, kNoMotion = 2;
+inline bool Crops(double framing) {
+  return framing == kCrop || framing == kCropAutoScale;
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,87 @@
+#include "host/stabilize/steady_clip.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+#include "host/stabilize/failures.h"
+#include "platform/hx/hx_controls.h"
+#include "tests/support/drawn_clip.h"
+#include "tests/support/scratch_folder.h"
+
+namespace calmframe::host {
+namespace {
+
+using Texts = std::vector<std::string>;
+
+// Stops the work as soon as it has come to a stage.
+class Onlooker final : public Watcher {
+ public:
+  explicit Onlooker(std::string last_stage = "") : last_stage_(std::move(last_stage)) {}
+  void Show(const Progress& progress) override {
+    if (stages.empty() || stages.back() != progress.stage) stages.push_back(progress.stage);
+  }
+  void Warn(const std::string& line) override { ADD_FAILURE() << line; }
+  bool Stops() override { return !stages.empty() && stages.back() == last_stage_; }
+
+  Texts stages;
+
+ private:
+  const std::string last_stage_;
+};
+
+class SteadyClipTest : public testing::Test {
+ protected:
+  SteadyClipTest() { WriteStreet(path_, Made(160, 120, 24, 25), 7); }
+
+  const ScratchFolder folder_;
+  const std::string path_ = folder_.In("street.mkv");
+};
+
+TEST_F(SteadyClipTest, FromAClipToWhatItShowsAndBack) {
+  Onlooker onlooker;
+  Project saved;
+  {
+    SteadyClip clip(CALMFRAME_PLUGIN, path_);
+    clip.SetControls({{HX_SMOOTHNESS.disk_id, 80}});
+    EXPECT_EQ(clip.Work(onlooker).Text(), "");
+    EXPECT_EQ(onlooker.stages, (Texts{"analyzing", "solving"}));
+    saved = clip.Saved();
+    const Outcome own = clip.Measure();
+    EXPECT_FALSE(own.follows);
+    EXPECT_LT(own.after.mean, own.before.mean / 2);
+    clip.FollowPicture(1.2, onlooker);
+    const Outcome following = clip.Measure();
+    EXPECT_TRUE(following.follows);
+    EXPECT_LT(following.after.mean, following.before.mean / 2);
+    EXPECT_LE(following.most_zoom, 1.2 + 1e-3);
+    // The picture again without its windows, and by other controls.
+    clip.SetControls({{HX_SMOOTHNESS.disk_id, 10}});
+    EXPECT_EQ(clip.Work(onlooker).Text(), "reused the analysis");
+    EXPECT_FALSE(clip.Measure().follows);
+    EXPECT_GT(clip.Measure().after.mean, own.after.mean);
+  }
+  SteadyClip again(CALMFRAME_PLUGIN, saved, path_);
+  EXPECT_EQ(again.Work(onlooker).Text(), "reused the analysis, the solve and the framing");
+  EXPECT_EQ(again.ValueOf(HX_SMOOTHNESS.disk_id), 80);
+}
+
+TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {
+  std::vector<Point> expected;
+  for (const char* stage : {"", "analyzing", "solving"}) {
+    SteadyClip clip(CALMFRAME_PLUGIN, path_);
+    Onlooker hasty(stage), patient;
+    if (*stage) {
+      EXPECT_THROW(clip.Work(hasty), Interrupted) << stage;
+    }
+    clip.Work(patient);
+    const SolvedClip solved = clip.Solved();
+    EXPECT_TRUE(solved.crop) << stage;
+    if (expected.empty()) expected = solved.vertices;
+    EXPECT_TRUE(solved.vertices == expected) << stage;
+  }
+}
+
+}  // namespace
+}  // namespace calmframe::host
