@@ -6,6 +6,12 @@
 #include "host/effects/host.h"
 
 namespace calmframe::host {
+namespace {
+
+// The parameter in which a host keeps the tracks that its user deleted.
+constexpr std::int16_t kDeletionsDiskId = 305;
+
+}  // namespace
 
 Effect::Effect(Host& host, boost::shared_ptr<Layer> layer)
     : host_(host),
@@ -42,6 +48,7 @@ Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position,
 Effect::~Effect() {
   const Host::LoopCall on_loop;
   instance_->Destroy({playhead_});
+  DisposeOfDeletions();
   standing_.reset();
   shared_->layer()->RemoveEffect(shared_->runtime_id());
 }
@@ -104,6 +111,55 @@ CommandResult Effect::TellChange(std::int32_t index) {
   }
   const CommandResult refreshed = Refresh();
   return result.ok() ? refreshed : result;
+}
+
+CommandResult Effect::DeletionsOp(HX_CustomDataExtra& extra) {
+  extra.param_id = kDeletionsDiskId;
+  HX_InData in{};
+  HX_OutData out{};
+  const Host::LoopCall on_loop;
+  return host_.Command(HX_CMD_CUSTOM_DATA_OP, in, out, nullptr, nullptr, &extra);
+}
+
+void Effect::DisposeOfDeletions() {
+  if (!deletions_) return;
+  const std::optional<HX_ParamDef> param = Param(IndexOf(kDeletionsDiskId));
+  HX_CustomDataExtra extra{};
+  extra.op = HX_DATA_DISPOSE;
+  extra.a = std::exchange(deletions_, nullptr);
+  const bool replaced = param && param->u.arb_d.value != extra.a;
+  DeletionsOp(extra);
+  if (!replaced) return;
+  extra.a = param->u.arb_d.value;
+  DeletionsOp(extra);
+}
+
+CommandResult Effect::DeleteTracks(const std::vector<TrackPoint>& points) try {
+  std::vector<std::uint64_t> keys;
+  keys.reserve(points.size());
+  for (const TrackPoint& point : points) {
+    keys.push_back(std::uint64_t{static_cast<std::uint32_t>(point.frame)} << 32 |
+                   static_cast<std::uint32_t>(point.slot));
+  }
+  HX_CustomDataExtra extra{};
+  extra.op = HX_DATA_UNFLATTEN;
+  extra.buffer = keys.data();
+  extra.size = static_cast<std::uint32_t>(keys.size() * sizeof(std::uint64_t));
+  CommandResult result = DeletionsOp(extra);
+  if (!result.ok()) return result;
+  if (!extra.out) return {HX_ERR_UNKNOWN, "The effect has no tracks to delete"};
+  DisposeOfDeletions();
+  deletions_ = extra.out;
+  HX_ParamDef param{};
+  param.disk_id = kDeletionsDiskId;
+  param.kind = HX_PARAM_ARBITRARY;
+  param.u.arb_d = {kDeletionsDiskId, nullptr, deletions_};
+  if (!shared_->params().SetByPlugin(IndexOf(kDeletionsDiskId), param)) {
+    shared_->params().Append(param);
+  }
+  return result;
+} catch (const std::bad_alloc&) {
+  return {HX_ERR_MEMORY, {}};
 }
 
 CommandResult Effect::Tick() {

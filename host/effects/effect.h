@@ -8,6 +8,7 @@
 
 #include "host/effects/instance.h"
 #include "host/effects/renderer.h"
+#include "host/effects/track_point.h"
 
 namespace calmframe::host {
 
@@ -44,6 +45,13 @@ class Effect {
   // An error, and no call, for a disabled button and for what is none.
   CommandResult Press(std::int32_t index);
 
+  // The tracks that these points lie on, and no others, are left out when the effect solves, which
+  // it does anew from its next tick on if that is a change; without points all are there again. A
+  // point stands for the track that began last in its slot, at its frame or before; one on none
+  // means nothing. An analysis forgets them. What is saved keeps those of its solve, and a loaded
+  // effect leaves them out until this is called. An error of a plug-in that knows no such tracks.
+  CommandResult DeleteTracks(const std::vector<TrackPoint>& points);
+
   // -- Upkeep --
   CommandResult Tick();
   CommandResult Refresh();  // of controls and readouts
@@ -68,6 +76,10 @@ class Effect {
   // Takes a flattened handle back into work.
   CommandResult Restore();
   CommandResult TellChange(std::int32_t index);
+  // Of a value of the parameter that holds the deleted tracks.
+  CommandResult DeletionsOp(HX_CustomDataExtra& extra);
+  // The last one that the effect was given, and the one that it may have put in its place.
+  void DisposeOfDeletions();
 
   Host& host_;
   const std::shared_ptr<TimelineEffect> shared_;
@@ -77,6 +89,7 @@ class Effect {
   CommandResult creation_;
   // Set while the handle is flattened, when it may be restored or destroyed and nothing else.
   HX_Handle flattened_ = nullptr;
+  HX_Handle deletions_ = nullptr;  // as they were given
   std::int64_t playhead_ = 0;
 };
 

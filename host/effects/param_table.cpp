@@ -87,6 +87,11 @@ bool ParamTable::SetByPlugin(std::int32_t index, const HX_ParamDef& param) {
   return true;
 }
 
+void ParamTable::Append(const HX_ParamDef& param) {
+  std::lock_guard lock(mutex_);
+  params_.push_back(param);
+}
+
 bool ParamTable::UpdateUI(std::int32_t index, const HX_ParamDef& param) {
   std::lock_guard lock(mutex_);
   if (index < 1 || static_cast<std::size_t>(index) >= params_.size()) return false;

@@ -36,6 +36,8 @@ class ParamTable {
   bool SetByUser(std::int32_t index, double value);
   // As the plug-in writes it: the whole value, as it comes. False for an unknown index.
   bool SetByPlugin(std::int32_t index, const HX_ParamDef& param);
+  // Behind all others.
+  void Append(const HX_ParamDef& param);
   // Name, flags and ui_flags.
   bool UpdateUI(std::int32_t index, const HX_ParamDef& param);
 

@@ -32,7 +32,8 @@ struct SolvedClip {
 
   // Places for tracks in a frame, at least 1. By frame and slot: where the track is, in the
   // source's own pixels, centres at whole numbers; and what it is: n > 0 a track that begins here,
-  // in row n - 1; 0 one that goes on; below 0 none here, and the position means nothing.
+  // in row n - 1; 0 one that goes on; -10 and -11 the two of one that is deleted, which nothing was
+  // solved with; else below 0 none here, and the position means nothing.
   int slots = 0;
   std::vector<Point> tracks;
   std::vector<std::int32_t> statuses;

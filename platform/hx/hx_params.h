@@ -57,7 +57,8 @@ typedef struct HX_Button {
 
 /* Values are handles that HX_CMD_CUSTOM_DATA_OP makes and frees. No effect declares such a
    parameter; a host that keeps the deleted track points of an effect (disk id 305) appends one to
-   those that the effect declared. */
+   those that the effect declared. The bytes of these are 8 a point, little-endian: the slot in the
+   lower 4, above it the frame of the source, in fields where that is interlaced. */
 typedef struct HX_ArbitraryData {
   int16_t id; /* the disk id */
   HX_Handle default_value, value;

@@ -91,6 +91,7 @@ TEST_F(SessionTest, SavesLoadsAndDuplicates) {
   EXPECT_NE(layer->state()->effects[0].parameters, unset);
   EXPECT_FALSE(effect.SetParam(kButton, 1).ok());
   EXPECT_FALSE(effect.Press(kAmount).ok());
+  EXPECT_FALSE(effect.DeleteTracks({{1, 2}}).ok()) << "it knows of no tracks";
   SavedEffect saved;
   ASSERT_TRUE(effect.Save(&saved).ok());
   EXPECT_TRUE(effect.Tick().ok());
