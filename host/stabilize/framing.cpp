@@ -10,6 +10,8 @@
 namespace calmframe::host {
 namespace {
 
+constexpr double kMostBlack = 0.001;  // of a frame
+
 // The share of the picture that stays black because the controls stop its enlargement, 0 to 1.
 double BlackShare(const SteadyClip& clip, double width, const CropWindow& crop) {
   const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };
@@ -56,16 +58,33 @@ CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watc
       value(HX_SMOOTHNESS) == HX_SMOOTHNESS.default_value &&
       value(HX_CROP_LESS_SMOOTH_MORE) == HX_CROP_LESS_SMOOTH_MORE.default_value &&
       value(HX_RESULT) == kSmoothMotion;
+  // Such a window was chosen before, and the controls are those that were chosen with it.
+  const bool chosen = clip.choice() != nullptr;
   const bool asked = settings.kind == Kind::follow || settings.most_zoom > 0;
   if (asked && !may_follow) {
     throw WindowRefused(
         "a window that follows the picture needs a framing that crops and scales, and no margin");
   }
-  if (settings.kind == Kind::steady || !may_follow || !(asked || as_it_comes)) {
+  // Still smoothed as it was set, the picture is shown by windows that follow it where the effect's
+  // own would show black. Without motion it would have to move.
+  const auto leaves_black = [&] {
+    return value(HX_RESULT) == kSmoothMotion && clip.Measure().most_black > kMostBlack;
+  };
+  const bool follows = may_follow && settings.kind != Kind::steady &&
+                       (asked || (!settings.as_set && (chosen || as_it_comes || leaves_black())));
+  if (!follows) {
+    if (chosen) {
+      clip.ForgetChoice();
+      clip.Work(watcher);
+    }
+    clip.HoldStill(settings.still, watcher);
     return CropTroubleOf(clip);
   }
-  clip.FollowPicture(settings.most_zoom > 0 ? settings.most_zoom : value(HX_MAXIMUM_SCALE) / 100,
-                     watcher);
+  clip.FollowPicture(
+      {.most_zoom = settings.most_zoom > 0 ? settings.most_zoom : value(HX_MAXIMUM_SCALE) / 100,
+       .may_choose = !settings.as_set,
+       .still = settings.still},
+      watcher);
   return {};
 }
 
