@@ -239,6 +239,18 @@ void AnotherSmoothness(benchmark::State& state) {
   state.counters["limit"] = 1.25;
 }
 
+// As it comes, which chooses for the clip, against the same with nothing chosen.
+void Choosing(benchmark::State& state) {
+  const std::string clip = ClipOf(state);
+  Medians medians(state);
+  for (auto _ : state) {
+    const double chosen = RunProcess({kProgram, "stabilize", clip, "-"});
+    state.SetIterationTime(chosen);
+    medians.Add("ratio", chosen / RunProcess({kProgram, "stabilize", clip, "-", "--as-set"}));
+  }
+  state.counters["limit"] = 1.35;
+}
+
 void Help(benchmark::State& state) {
   Medians medians(state);
   for (auto _ : state) {
@@ -258,6 +270,7 @@ void Once(benchmark::internal::Benchmark* benchmark) {
 
 BENCHMARK(BesideVidstab)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
 BENCHMARK(BesideOpencvTwoPass)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
+BENCHMARK(Choosing)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
 BENCHMARK(AnotherSmoothness)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
 BENCHMARK(PeakMemory)->Args({1920, 1080, 300})->Args({1920, 1080, 3000})->Apply(Once);
 BENCHMARK(Help)->Iterations(25)->UseManualTime()->Unit(benchmark::kMillisecond);
