@@ -217,7 +217,7 @@ HX_Err MayStart(HX_EffectRef, std::uint8_t* may) {
 }
 HX_Err GetCompressionPreference(std::uint8_t* raw) {
   return WithHost("Analysis Host.GetCompressionPreference", [&](Host& host) -> HX_Err {
-    *raw = host.settings().keeps_analysis_raw ? 1 : 0;
+    *raw = host.keeps_analysis_raw() ? 1 : 0;
     return HX_ERR_NONE;
   });
 }

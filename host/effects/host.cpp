@@ -51,6 +51,7 @@ Host::Host(const std::string& library, const HostSettings& settings)
 
 Host::Host(PluginLibrary library, const HostSettings& settings)
     : settings_(settings),
+      keeps_analysis_raw_(settings.keeps_analysis_raw),
       experimental_(settings.experimental_parameters),
       library_(std::move(library)),
       media_(settings.media),

@@ -25,7 +25,7 @@ namespace calmframe::host {
 struct HostSettings {
   MediaSettings media;
   std::string project_path;         // UTF-8; empty is legal
-  bool keeps_analysis_raw = false;  // plug-ins are asked not to compress what they save
+  bool keeps_analysis_raw = false;  // at first; see Host::KeepAnalysisRaw
   // Plug-ins declare their parameters for experts, too; the first host that loads one settles it
   // for as long as the process keeps the library. The solve's log, which comes with the option, is
   // shown where the environment asks for it.
@@ -64,6 +64,9 @@ class Host {
   CommandResult About();
 
   const HostSettings& settings() const { return settings_; }
+  // Whether plug-ins are asked not to compress what they save. Any thread.
+  void KeepAnalysisRaw(bool raw) { keeps_analysis_raw_ = raw; }
+  bool keeps_analysis_raw() const { return keeps_analysis_raw_; }
   MediaServices& media() { return media_; }
   UserInterface& user_interface() { return user_interface_; }
   HandleStore& handles() { return handles_; }
@@ -119,6 +122,7 @@ class Host {
   };
 
   const HostSettings settings_;
+  std::atomic<bool> keeps_analysis_raw_;
   const ExperimentalParameters experimental_;
   PluginLibrary library_;
   MediaServices media_;

@@ -99,25 +99,23 @@ Chooser::Chooser(const SolvedClip& clip, const FollowSettings& settings, double 
     : settings_(settings),
       frames_per_second_(frames_per_second),
       weights_(weights),
-      source_(FindMotion(clip, Warps::none)),
+      source_(FindMotion(WarpedPlane(clip, Warps::none))),
       as_filmed_(MotionOfSource(clip, source_)) {
   choice_.most_zoom = settings.most_zoom;
 }
 
-PictureMotion Chooser::MotionOf(const Candidate& candidate, const SolvedClip& solved) const {
-  return candidate.warps == Warps::none ? source_ : FindMotion(solved, candidate.warps);
-}
-
-std::vector<Similarity> Chooser::WindowsOf(const Candidate& candidate, const SolvedClip& solved,
+std::vector<Similarity> Chooser::WindowsOf(const Candidate& candidate, const WarpedPlane& plane,
                                            const PictureMotion& motion) const {
   if (!candidate.follows) return std::vector<Similarity>(motion.background.size());
   FollowSettings settings = settings_;
   settings.weights.width = candidate.width_weight;
-  return FollowWindows(solved, candidate.warps, motion, settings);
+  return FollowWindows(plane, motion, settings);
 }
 
 bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_best_width) {
-  const PictureMotion motion = MotionOf(candidate, solved);
+  const WarpedPlane plane(solved, candidate.warps);
+  const PictureMotion moved = candidate.warps == Warps::none ? PictureMotion() : FindMotion(plane);
+  const PictureMotion& motion = candidate.warps == Warps::none ? source_ : moved;
   std::vector<Candidate> tries;
   if (by_best_width) {
     candidate.width_weight = choice_.best().width_weight;
@@ -132,9 +130,9 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
       [&](std::size_t i) {
         Candidate& at = tries[i];
-        windows[i] = WindowsOf(at, solved, motion);
-        at.outcome = MeasureOutcome(as_filmed_, MotionShown(solved, at.warps, motion, windows[i]),
-                                    frames_per_second_);
+        windows[i] = WindowsOf(at, plane, motion);
+        at.outcome =
+            MeasureOutcome(as_filmed_, MotionShown(plane, motion, windows[i]), frames_per_second_);
         at.outcome.window = Outcome::Window::follow;
         at.outcome.bends = at.warps == Warps::solved;
         at.cost = CostOf(at);
@@ -154,9 +152,9 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
   return true;
 }
 
-void Chooser::ConsiderAsFilmed(const SolvedClip& clip) {
+void Chooser::ConsiderAsFilmed() {
   Candidate filmed{.name = "as filmed", .warps = Warps::none, .follows = false};
-  std::vector<Similarity> windows = WindowsOf(filmed, clip, source_);
+  std::vector<Similarity> windows(source_.background.size());
   filmed.outcome = MeasureOutcome(as_filmed_, as_filmed_, frames_per_second_);
   filmed.outcome.window = Outcome::Window::none;
   filmed.outcome.bends = false;
@@ -172,7 +170,8 @@ void Chooser::ConsiderAsFilmed(const SolvedClip& clip) {
 
 void Chooser::Take(const Choice& choice, const SolvedClip& solved) {
   choice_ = choice;
-  windows_ = WindowsOf(choice_.best(), solved, MotionOf(choice_.best(), solved));
+  const WarpedPlane plane(solved, choice_.best().warps);
+  windows_ = WindowsOf(choice_.best(), plane, FindMotion(plane));
 }
 
 bool Chooser::leaves_shake() const {

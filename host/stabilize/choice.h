@@ -76,7 +76,7 @@ class Chooser {
   bool Consider(Candidate candidate, const SolvedClip& solved, bool by_best_width = false);
   // After all others: the clip as it was filmed, which is taken where none of them is calmer, or
   // all leave black. What it has ahead of them, its width, counts for nothing.
-  void ConsiderAsFilmed(const SolvedClip& clip);
+  void ConsiderAsFilmed();
   // The windows of a candidate that was chosen before, with its solve.
   void Take(const Choice& choice, const SolvedClip& solved);
 
@@ -87,8 +87,7 @@ class Chooser {
   bool leaves_shake() const;
 
  private:
-  PictureMotion MotionOf(const Candidate& candidate, const SolvedClip& solved) const;
-  std::vector<Similarity> WindowsOf(const Candidate& candidate, const SolvedClip& solved,
+  std::vector<Similarity> WindowsOf(const Candidate& candidate, const WarpedPlane& plane,
                                     const PictureMotion& motion) const;
   // Less is better: first whether black is left, then the cost.
   std::pair<bool, double> RankOf(const Candidate& candidate) const;

@@ -20,9 +20,10 @@ Similarity Moved(const Similarity& of, Point by) {
 
 }  // namespace
 
-std::vector<Similarity> FollowWindows(const SolvedClip& clip, Warps warps,
-                                      const PictureMotion& motion, const FollowSettings& settings) {
-  const WarpedPlane source(clip, Warps::none), plane(clip, warps);
+std::vector<Similarity> FollowWindows(const WarpedPlane& plane, const PictureMotion& motion,
+                                      const FollowSettings& settings) {
+  const SolvedClip& clip = plane.clip();
+  const WarpedPlane source(clip, Warps::none);
   std::vector<WindowFrame> frames(static_cast<std::size_t>(clip.frame_count));
   for (std::size_t f = 0; f < frames.size(); ++f) {
     WindowFrame& frame = frames[f];
@@ -59,9 +60,9 @@ std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom) {
   return windows;
 }
 
-ShownMotion MotionShown(const SolvedClip& clip, Warps warps, const PictureMotion& motion,
+ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
                         const std::vector<Similarity>& windows) {
-  const WarpedPlane plane(clip, warps);
+  const SolvedClip& clip = plane.clip();
   const Point middle = Middle(clip);
   ShownMotion shown;
   shown.width = clip.width;

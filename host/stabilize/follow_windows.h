@@ -5,6 +5,7 @@
 #include "host/stabilize/measures.h"
 #include "host/stabilize/picture_motion.h"
 #include "host/stabilize/solved_clip.h"
+#include "host/stabilize/warped_plane.h"
 #include "host/stabilize/window/window_path.h"
 
 namespace calmframe::host {
@@ -18,15 +19,15 @@ struct FollowSettings {
 // For each frame the part of the stabilized plane that the output shows, as WithWindows takes it:
 // the calmest windows that stay where the frame's warp puts the picture, and below the zoom; see
 // FindWindowPath. A frame whose warp is folded counts as one that fills the plane's corner.
-std::vector<Similarity> FollowWindows(const SolvedClip& clip, Warps warps,
-                                      const PictureMotion& motion, const FollowSettings& settings);
+std::vector<Similarity> FollowWindows(const WarpedPlane& plane, const PictureMotion& motion,
+                                      const FollowSettings& settings);
 
 // What the effect shows by itself: its own crop windows, enlarged `zoom` times; without a crop
 // windows in the plane's corner, where a frame lies that is not warped.
 std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom);
 
-// What these windows show. `motion`: that of the plane, with its warps or without.
-ShownMotion MotionShown(const SolvedClip& clip, Warps warps, const PictureMotion& motion,
+// What these windows show. `motion`: that of the plane.
+ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
                         const std::vector<Similarity>& windows);
 // What the source shows. `motion`: without warps.
 ShownMotion MotionOfSource(const SolvedClip& clip, const PictureMotion& motion);

@@ -6,7 +6,6 @@
 #include <cstddef>
 #include <optional>
 
-#include "host/stabilize/warped_plane.h"
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
 
@@ -18,7 +17,8 @@ struct TrackPairs {
   std::vector<Point> before, now;  // equally many
 };
 
-TrackPairs PairsOf(const SolvedClip& clip, const WarpedPlane& plane, std::size_t frame) {
+TrackPairs PairsOf(const WarpedPlane& plane, std::size_t frame) {
+  const SolvedClip& clip = plane.clip();
   TrackPairs pairs;
   const auto slots = static_cast<std::size_t>(clip.slots);
   for (std::size_t s = 0; s < slots; ++s) {
@@ -73,7 +73,7 @@ std::optional<Homography> Solve(std::array<std::array<double, 8>, 8> a, Homograp
 // Of points in halves of the width.
 Homography Fit(const TrackPairs& pairs, double unit, const Similarity& start) {
   Homography h{start.a, -start.b, start.dx / unit, start.b, start.a, start.dy / unit, 0, 0};
-  constexpr int kRounds = 6;
+  constexpr int kRounds = 4;
   constexpr double kFarthest = 1.5 * kTolerance * 2;
   for (int round = 0; round < kRounds; ++round) {
     std::array<std::array<double, 8>, 8> a{};
@@ -157,7 +157,8 @@ std::vector<double> Flicker(const std::vector<Cells>& cells) {
 }
 
 // Of at least five frames.
-std::vector<TrackPath> PathsOf(const SolvedClip& clip, const WarpedPlane& plane) {
+std::vector<TrackPath> PathsOf(const WarpedPlane& plane) {
+  const SolvedClip& clip = plane.clip();
   std::vector<TrackPath> paths;
   const auto slots = static_cast<std::size_t>(clip.slots);
   const auto frames = static_cast<std::size_t>(clip.frame_count);
@@ -182,21 +183,21 @@ std::vector<TrackPath> PathsOf(const SolvedClip& clip, const WarpedPlane& plane)
 
 }  // namespace
 
-PictureMotion FindMotion(const SolvedClip& clip, Warps warps) {
-  const WarpedPlane plane(clip, warps);
+PictureMotion FindMotion(const WarpedPlane& plane) {
+  const SolvedClip& clip = plane.clip();
   const auto frames = static_cast<std::size_t>(clip.frame_count);
   PictureMotion motion{std::vector<Similarity>(frames), {}, {}};
   std::vector<Cells> cells(frames);
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
       [&](std::size_t before) {
         const std::size_t f = before + 1;
-        const TrackPairs pairs = PairsOf(clip, plane, f);
+        const TrackPairs pairs = PairsOf(plane, f);
         motion.background[f] = FitMotion(pairs.now, pairs.before, kTolerance * clip.width);
         cells[f] = Residuals(pairs, Inverse(motion.background[f]), clip.width, clip.height);
       },
       frames - 1);
   motion.wobble = Flicker(cells);
-  motion.paths = PathsOf(clip, plane);
+  motion.paths = PathsOf(plane);
   return motion;
 }
 

@@ -3,7 +3,7 @@
 #include <cstddef>
 #include <vector>
 
-#include "host/stabilize/solved_clip.h"
+#include "host/stabilize/warped_plane.h"
 
 namespace calmframe::host {
 
@@ -26,8 +26,8 @@ struct PictureMotion {
   std::vector<TrackPath> paths;  // of the tracks, pixels about the frame's middle
 };
 
-// By the tracks that are not deleted, where the warps put them or where they were filmed. Uses all
-// processors; the same on any number.
-PictureMotion FindMotion(const SolvedClip& clip, Warps warps);
+// By the tracks of the plane's clip that are not deleted. Uses all processors; the same on any
+// number.
+PictureMotion FindMotion(const WarpedPlane& plane);
 
 }  // namespace calmframe::host

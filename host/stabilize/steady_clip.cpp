@@ -69,6 +69,8 @@ HostSettings SettingsFor(const media::ClipInfo& info) {
   constexpr std::size_t kFrames = 6;
   settings.media.cache_bytes =
       kFrames * static_cast<std::size_t>(info.width) * static_cast<std::size_t>(info.height) * 4;
+  // Of what is saved time and again while a clip is worked, a project alone is to be small.
+  settings.keeps_analysis_raw = true;
   return settings;
 }
 
@@ -461,10 +463,10 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   chooser.Consider({.name = "as set"}, solved);
   // Whoever asks for a method has its warps; deblurring goes by theirs, too.
   if (request.may_choose && IsFree(kMethod) && ValueOf(kDeblur) == 0) {
-    chooser.Consider({.name = "not bent", .warps = Warps::none}, solved);
+    chooser.Consider({.name = "not bent", .warps = Warps::none}, solved, true);
   }
   if (request.may_choose && chooser.leaves_shake()) TryControls(chooser, watcher);
-  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved);
+  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed();
   choice_ = chooser.choice();
   has_new_choice_ = true;
   choice_->still = still;
@@ -562,11 +564,10 @@ Outcome SteadyClip::Measure() {
   if (drawn_) return choice_->best().outcome;
   const SolvedClip solved = Solved();
   const double zoom = Zoom(solved);
-  Outcome outcome =
-      MeasureOutcome(MotionOfSource(solved, FindMotion(solved, Warps::none)),
-                     MotionShown(solved, Warps::solved, FindMotion(solved, Warps::solved),
-                                 OwnWindows(solved, zoom)),
-                     FramesPerSecond());
+  const WarpedPlane plane(solved, Warps::solved), rest(solved, Warps::none);
+  Outcome outcome = MeasureOutcome(MotionOfSource(solved, FindMotion(rest)),
+                                   MotionShown(plane, FindMotion(plane), OwnWindows(solved, zoom)),
+                                   FramesPerSecond());
   if (solved.crop) {  // the effect draws the window alone, which a maximum scale leaves small
     const double across = std::min(1.0, zoom * solved.crop->width / solved.width);
     const double down = std::min(1.0, zoom * solved.crop->height / solved.height);
@@ -591,7 +592,9 @@ double SteadyClip::Zoom(const SolvedClip& solved) const {
 
 Project SteadyClip::Saved() {
   Project project;
+  host_.KeepAnalysisRaw(false);
   const CommandResult saved = effect_->Save(&project.effect);
+  host_.KeepAnalysisRaw(true);
   if (!saved.ok()) throw SolveFailure(saved.Line(path()));
   const auto layer = effect_->shared()->layer()->state();
   project.clip_path = path();

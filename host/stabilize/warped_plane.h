@@ -17,6 +17,8 @@ class WarpedPlane {
  public:
   WarpedPlane(const SolvedClip& clip, Warps warps);
 
+  const SolvedClip& clip() const { return clip_; }
+
   WarpView Warp(std::size_t frame) const {
     return {vertices_.data() + frame * of_frame_, clip_.columns, clip_.rows};
   }

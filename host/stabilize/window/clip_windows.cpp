@@ -141,7 +141,10 @@ double UncoveredShare(const WarpView& warp, double width, double height) {
 Similarity FitMotion(const std::vector<Point>& from, const std::vector<Point>& to,
                      double tolerance) {
   if (from.size() < 3) return {};
-  constexpr int kPairs = 200;
+  // At least so many pairs; then until one of two points on the best motion was among them but for
+  // a chance of 1 in 1000 (Fischler and Bolles, Communications of the ACM 24, 1981), at most 200.
+  constexpr int kFewestPairs = 30, kMostPairs = 200;
+  const double kMissed = std::log(0.001);
   constexpr std::size_t kJudges = 250;  // points by which a pair is judged, evenly out of all
   const std::size_t every = (from.size() + kJudges - 1) / kJudges;
   std::uint64_t state = 1;  // a fixed series: Knuth's 64-bit congruential generator
@@ -159,7 +162,9 @@ Similarity FitMotion(const std::vector<Point>& from, const std::vector<Point>& t
   };
   Similarity best;
   double best_score = -1;
-  for (int pair = 0; pair < kPairs; ++pair) {
+  const double judges = std::ceil(static_cast<double>(from.size()) / static_cast<double>(every));
+  double pairs = kMostPairs;
+  for (int pair = 0; pair < std::max<double>(pairs, kFewestPairs); ++pair) {
     const std::size_t i = next(), j = next();
     const double x = from[j].x - from[i].x, y = from[j].y - from[i].y;
     if (x * x + y * y < 100 * square) continue;  // too near to tell a turn
@@ -168,6 +173,8 @@ Similarity FitMotion(const std::vector<Point>& from, const std::vector<Point>& t
     if (reached <= best_score) continue;
     best_score = reached;
     best = fit;
+    const double share = std::clamp(reached / judges, 0.001, 0.999);
+    pairs = std::min<double>(kMostPairs, kMissed / std::log(1 - share * share));
   }
   constexpr int kRounds = 8;
   std::vector<double> weights(from.size());

@@ -55,7 +55,7 @@ Choice Best(const SolvedClip& clip, const std::vector<Candidate>& candidates,
             const FollowSettings& settings = {}) {
   Chooser chooser(clip, settings, 30);
   for (const Candidate& candidate : candidates) chooser.Consider(candidate, clip);
-  if (settings.enlarged == 1) chooser.ConsiderAsFilmed(clip);
+  if (settings.enlarged == 1) chooser.ConsiderAsFilmed();
   EXPECT_EQ(chooser.windows().size(), 90u);
   return chooser.choice();
 }
