@@ -10,7 +10,7 @@ namespace calmframe::media {
 namespace {
 
 // In AV_TIME_BASE ticks. Subtitles that began so long before a part are still found.
-constexpr std::int64_t kLongestText = 30 * std::int64_t{AV_TIME_BASE};
+constexpr std::int64_t kLongestSubtitle = 30 * std::int64_t{AV_TIME_BASE};
 // So far containers may lay the packets of one instant apart.
 constexpr std::int64_t kInterleaving = 10 * std::int64_t{AV_TIME_BASE};
 
@@ -120,7 +120,7 @@ StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVForma
     AdvanceTimecode(source, *tags);
   }
   // Where that can't be, what lies before the part is read and dropped.
-  const std::int64_t from = offset_.In(AV_TIME_BASE_Q) - kLongestText;
+  const std::int64_t from = offset_.In(AV_TIME_BASE_Q) - kLongestSubtitle;
   if (input_->start_time == AV_NOPTS_VALUE || from > input_->start_time) {
     av_seek_frame(input_.get(), -1, from, AVSEEK_FLAG_BACKWARD);
   }
