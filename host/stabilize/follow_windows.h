@@ -13,6 +13,11 @@ namespace calmframe::host {
 struct FollowSettings {
   double most_zoom = 1.5;  // of the source, by the window and the warp together; at least 1
   double enlarged = 1;     // on top of that; below 1 the picture gets a rim
+  // Percent a second by which the output's zoom changes at most, at least 0: how fast it shows the
+  // background grow or shrink beside what the camera makes of it, calmed. Gives way to the zoom's
+  // limit and to what is covered.
+  double zoom_speed = 5;
+  double frames_per_second = 30;  // above 0; fields, of an interlaced clip
   WindowWeights weights = {};
 };
 
