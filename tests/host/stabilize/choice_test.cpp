@@ -109,12 +109,12 @@ TEST(ChooserTest, AnEnlargementComesOnTop) {
 TEST(FollowWindowsTest, WhatTheCameraZoomsIsNoChangeOfZoom) {
   const SolvedClip clip = Filmed(0, 1.003);
   for (const Warps warps : {Warps::none, Warps::solved}) {
-    const PictureMotion motion = FindMotion(clip, warps);
+    const WarpedPlane plane(clip, warps);
+    const PictureMotion motion = FindMotion(plane);
     FollowSettings settings;
     const auto most_change = [&](double speed) {
       settings.zoom_speed = speed;
-      const ShownMotion shown =
-          MotionShown(clip, warps, motion, FollowWindows(clip, warps, motion, settings));
+      const ShownMotion shown = MotionShown(plane, motion, FollowWindows(plane, motion, settings));
       const auto [least, most] = std::minmax_element(shown.zooms.begin(), shown.zooms.end());
       return *most / *least;
     };
