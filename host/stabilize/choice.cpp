@@ -108,7 +108,7 @@ Chooser::Chooser(const SolvedClip& clip, const FollowSettings& settings,
 
 std::vector<Similarity> Chooser::WindowsOf(const Candidate& candidate, const WarpedPlane& plane,
                                            const PictureMotion& motion) const {
-  if (!candidate.follows) return std::vector<Similarity>(motion.background.size());
+  if (!candidate.follows) return WholeFrames(plane.clip());
   FollowSettings settings = settings_;
   settings.weights.width = candidate.width_weight;
   return FollowWindows(plane, motion, settings);
@@ -154,9 +154,9 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
   return true;
 }
 
-void Chooser::ConsiderAsFilmed() {
+void Chooser::ConsiderAsFilmed(const SolvedClip& clip) {
   Candidate filmed{.name = "as filmed", .warps = Warps::none, .follows = false};
-  std::vector<Similarity> windows(source_.background.size());
+  std::vector<Similarity> windows = WholeFrames(clip);
   filmed.outcome = MeasureOutcome(as_filmed_, as_filmed_, settings_.frames_per_second);
   filmed.outcome.window = Outcome::Window::none;
   filmed.outcome.bends = false;

@@ -76,7 +76,7 @@ class Chooser {
   bool Consider(Candidate candidate, const SolvedClip& solved, bool by_best_width = false);
   // After all others: the clip as it was filmed, which is taken where none of them is calmer, or
   // all leave black. What it has ahead of them, its width, counts for nothing.
-  void ConsiderAsFilmed();
+  void ConsiderAsFilmed(const SolvedClip& clip);
   // The windows of a candidate that was chosen before, with its solve.
   void Take(const Choice& choice, const SolvedClip& solved);
 

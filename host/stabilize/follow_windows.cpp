@@ -97,6 +97,14 @@ std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom) {
   return windows;
 }
 
+std::vector<Similarity> WholeFrames(const SolvedClip& clip) {
+  constexpr double kInside = 1.0 / 64;  // warps are kept in steps of 1 / 256
+  const double scale = 1 - 2 * kInside / std::min(clip.width, clip.height);
+  const Point middle = Middle(clip);
+  const Similarity window{scale, 0, middle.x * (1 - scale), middle.y * (1 - scale)};
+  return std::vector<Similarity>(static_cast<std::size_t>(clip.frame_count), window);
+}
+
 ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
                         const std::vector<Similarity>& windows) {
   const SolvedClip& clip = plane.clip();

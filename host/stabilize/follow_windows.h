@@ -31,6 +31,10 @@ std::vector<Similarity> FollowWindows(const WarpedPlane& plane, const PictureMot
 // windows in the plane's corner, where a frame lies that is not warped.
 std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom);
 
+// The whole frame where it lies that is not warped, but for a hundredth of a pixel along its edges:
+// there what is drawn rounds to the frame or beside it.
+std::vector<Similarity> WholeFrames(const SolvedClip& clip);
+
 // What these windows show. `motion`: that of the plane.
 ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
                         const std::vector<Similarity>& windows);

@@ -469,7 +469,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
     chooser.Consider({.name = "not bent", .warps = Warps::none}, solved, true);
   }
   if (request.may_choose && chooser.leaves_shake()) TryControls(chooser, watcher);
-  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed();
+  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved);
   choice_ = chooser.choice();
   has_new_choice_ = true;
   choice_->still = still;

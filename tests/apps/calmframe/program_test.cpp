@@ -179,6 +179,18 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
              "needs --framing crop-auto-scale");
 }
 
+// A camera on a tripod can't be calmed, and its frames come out whole, to their edges.
+TEST_F(ProgramTest, WhatNothingCalmsPassesThrough) {
+  MakeWall("in.mkv", Made(160, 120, 12, 25), [](double) { return Camera{}; });
+  EXPECT_THAT(RunWell("stabilize in.mkv out.mkv --codec ffv1 --quiet --json"),
+              HasSubstr("\"window\":\"none\""));
+  const auto in = ClipReader::Open(Path("in.mkv")), out = ClipReader::Open(Path("out.mkv"));
+  for (const int frame : {0, 11}) {
+    const auto a = ReadFrame(*in, frame), b = ReadFrame(*out, frame);
+    for (std::size_t i = 0; i < a.size(); ++i) ASSERT_NEAR(a[i].green, b[i].green, 3) << i;
+  }
+}
+
 TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
   MakeWall("in.mkv", Made(160, 120, 24, 25), AlongTheWall);
   ExpectLine("stabilize in.mkv out.mkv --quiet --result no-motion", 5,

@@ -57,7 +57,7 @@ Choice Best(const SolvedClip& clip, const std::vector<Candidate>& candidates,
             const FollowSettings& settings = {}) {
   Chooser chooser(clip, settings);
   for (const Candidate& candidate : candidates) chooser.Consider(candidate, clip);
-  if (settings.enlarged == 1) chooser.ConsiderAsFilmed();
+  if (settings.enlarged == 1) chooser.ConsiderAsFilmed(clip);
   EXPECT_EQ(chooser.windows().size(), 90u);
   return chooser.choice();
 }
