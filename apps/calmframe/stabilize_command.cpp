@@ -104,6 +104,12 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
   CLI::Option* const zoom = AddNumber<double>(
       command, "--zoom-at-most", [&flags](double most) { flags.window.most_zoom = most; }, "ZOOM",
       1, 100, "How far a window that follows may enlarge; at first as far as --maximum-scale, 1.5");
+  CLI::Option* const zoom_speed = AddNumber<double>(
+      command, "--zoom-speed", [&flags](double speed) { flags.window.zoom_speed = speed; },
+      "PERCENT", 0, 1000,
+      "How fast a window that follows may change its zoom, in percent a second, beside what the "
+      "camera itself does; more only where nothing else keeps black out of the picture");
+  TellDefault(*zoom_speed, "5");
   CLI::Option* const steady = AddChoice(
       command, "--steady",
       [&flags](const std::string& name) {
@@ -118,7 +124,7 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
       command, "--as-set", flags.window.as_set,
       "Choose nothing for the clip: the controls as they are set, or as they come, and the "
       "effect's own window");
-  PutInGroup("Window", {window, zoom, steady, as_set});
+  PutInGroup("Window", {window, zoom, zoom_speed, steady, as_set});
   CLI::Option* const crf = AddNumber<int>(
       command, "--crf", [&flags](int value) { flags.encode.crf = value; }, "N", 0, 63,
       "How much the encoder may lose: less looks better and makes larger files");

@@ -51,6 +51,7 @@ nlohmann::ordered_json Choice::Json() const {
   nlohmann::ordered_json object;
   object["still"] = kStills[static_cast<std::size_t>(still)];
   object["most_zoom"] = most_zoom;
+  object["zoom_speed"] = zoom_speed;
   object["given"] = ToJson(given);
   object["candidates"] = nlohmann::ordered_json::array();
   for (std::size_t i = 0; i < candidates.size(); ++i) {
@@ -74,6 +75,7 @@ std::optional<Choice> Choice::Parse(const std::string& text) {
     if (named == std::end(kStills)) return {};
     choice.still = static_cast<Still>(named - std::begin(kStills));
     choice.most_zoom = object.at("most_zoom").get<double>();
+    choice.zoom_speed = object.at("zoom_speed").get<double>();
     choice.given = ToValues(object.at("given"));
     for (const nlohmann::json& row : object.at("candidates")) {
       Candidate candidate;
@@ -94,19 +96,19 @@ std::optional<Choice> Choice::Parse(const std::string& text) {
   }
 }
 
-Chooser::Chooser(const SolvedClip& clip, const FollowSettings& settings, double frames_per_second,
+Chooser::Chooser(const SolvedClip& clip, const FollowSettings& settings,
                  const ChoiceWeights& weights)
     : settings_(settings),
-      frames_per_second_(frames_per_second),
       weights_(weights),
       source_(FindMotion(WarpedPlane(clip, Warps::none))),
       as_filmed_(MotionOfSource(clip, source_)) {
   choice_.most_zoom = settings.most_zoom;
+  choice_.zoom_speed = settings.zoom_speed;
 }
 
 std::vector<Similarity> Chooser::WindowsOf(const Candidate& candidate, const WarpedPlane& plane,
                                            const PictureMotion& motion) const {
-  if (!candidate.follows) return std::vector<Similarity>(motion.background.size());
+  if (!candidate.follows) return WholeFrames(plane.clip());
   FollowSettings settings = settings_;
   settings.weights.width = candidate.width_weight;
   return FollowWindows(plane, motion, settings);
@@ -131,8 +133,8 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
       [&](std::size_t i) {
         Candidate& at = tries[i];
         windows[i] = WindowsOf(at, plane, motion);
-        at.outcome =
-            MeasureOutcome(as_filmed_, MotionShown(plane, motion, windows[i]), frames_per_second_);
+        at.outcome = MeasureOutcome(as_filmed_, MotionShown(plane, motion, windows[i]),
+                                    settings_.frames_per_second);
         at.outcome.window = Outcome::Window::follow;
         at.outcome.bends = at.warps == Warps::solved;
         at.cost = CostOf(at);
@@ -152,10 +154,10 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
   return true;
 }
 
-void Chooser::ConsiderAsFilmed() {
+void Chooser::ConsiderAsFilmed(const SolvedClip& clip) {
   Candidate filmed{.name = "as filmed", .warps = Warps::none, .follows = false};
-  std::vector<Similarity> windows(source_.background.size());
-  filmed.outcome = MeasureOutcome(as_filmed_, as_filmed_, frames_per_second_);
+  std::vector<Similarity> windows = WholeFrames(clip);
+  filmed.outcome = MeasureOutcome(as_filmed_, as_filmed_, settings_.frames_per_second);
   filmed.outcome.window = Outcome::Window::none;
   filmed.outcome.bends = false;
   filmed.cost = CostOf(filmed);

@@ -47,17 +47,17 @@ enum class Still : std::uint8_t { automatic, all, background, subject };
 
 // What was chosen for a clip, and what of.
 struct Choice {
-  Still still = Still::all;  // never automatic
-  double most_zoom = 0;      // that the windows were held to
-  ParamValues given;         // of the parameters that candidates change: as the user has them
+  Still still = Still::all;              // never automatic
+  double most_zoom = 0, zoom_speed = 0;  // that the windows were held to
+  ParamValues given;  // of the parameters that candidates change: as the user has them
   std::vector<Candidate> candidates;  // at least one; the first is what was asked for
   std::size_t taken = 0;              // of the candidates
 
   const Candidate& best() const { return candidates[taken]; }
   // What was taken, of how many: "method position-scale-rotation, of 7 ways tried".
   std::string Text() const;
-  // As projects keep it and programs read it: "still", "most_zoom", "given", and "candidates" with
-  // "name", "changes", "taken", "cost" and the names of Outcome::Json.
+  // As projects keep it and programs read it: "still", "most_zoom", "zoom_speed", "given", and
+  // "candidates" with "name", "changes", "taken", "cost" and the names of Outcome::Json.
   nlohmann::ordered_json Json() const;
   // None of what is no choice.
   static std::optional<Choice> Parse(const std::string& text);
@@ -67,7 +67,7 @@ struct Choice {
 class Chooser {
  public:
   // `clip`: any solve of it, for what the source does.
-  Chooser(const SolvedClip& clip, const FollowSettings& settings, double frames_per_second,
+  Chooser(const SolvedClip& clip, const FollowSettings& settings,
           const ChoiceWeights& weights = {});
 
   // Measures a candidate with a solve of it; true where it is the best so far. Its windows are the
@@ -76,7 +76,7 @@ class Chooser {
   bool Consider(Candidate candidate, const SolvedClip& solved, bool by_best_width = false);
   // After all others: the clip as it was filmed, which is taken where none of them is calmer, or
   // all leave black. What it has ahead of them, its width, counts for nothing.
-  void ConsiderAsFilmed();
+  void ConsiderAsFilmed(const SolvedClip& clip);
   // The windows of a candidate that was chosen before, with its solve.
   void Take(const Choice& choice, const SolvedClip& solved);
 
@@ -96,7 +96,6 @@ class Chooser {
   double CostOf(const Candidate& candidate) const;
 
   const FollowSettings settings_;
-  const double frames_per_second_;
   const ChoiceWeights weights_;
   const PictureMotion source_;
   const ShownMotion as_filmed_;

@@ -13,6 +13,11 @@ namespace calmframe::host {
 struct FollowSettings {
   double most_zoom = 1.5;  // of the source, by the window and the warp together; at least 1
   double enlarged = 1;     // on top of that; below 1 the picture gets a rim
+  // Percent a second by which the output's zoom changes at most, at least 0: how fast it shows the
+  // background grow or shrink beside what the camera makes of it, calmed. Gives way to the zoom's
+  // limit and to what is covered.
+  double zoom_speed = 5;
+  double frames_per_second = 30;  // above 0; fields, of an interlaced clip
   WindowWeights weights = {};
 };
 
@@ -25,6 +30,10 @@ std::vector<Similarity> FollowWindows(const WarpedPlane& plane, const PictureMot
 // What the effect shows by itself: its own crop windows, enlarged `zoom` times; without a crop
 // windows in the plane's corner, where a frame lies that is not warped.
 std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom);
+
+// The whole frame where it lies that is not warped, but for a hundredth of a pixel along its edges:
+// there what is drawn rounds to the frame or beside it.
+std::vector<Similarity> WholeFrames(const SolvedClip& clip);
 
 // What these windows show. `motion`: that of the plane.
 ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,

@@ -60,7 +60,7 @@ CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watc
       value(HX_RESULT) == kSmoothMotion;
   // Such a window was chosen before, and the controls are those that were chosen with it.
   const bool chosen = clip.choice() != nullptr;
-  const bool asked = settings.kind == Kind::follow || settings.most_zoom > 0;
+  const bool asked = settings.kind == Kind::follow || settings.most_zoom > 0 || settings.zoom_speed;
   if (asked && !may_follow) {
     throw WindowRefused(
         "a window that follows the picture needs a framing that crops and scales, and no margin");
@@ -82,6 +82,7 @@ CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watc
   }
   clip.FollowPicture(
       {.most_zoom = settings.most_zoom > 0 ? settings.most_zoom : value(HX_MAXIMUM_SCALE) / 100,
+       .zoom_speed = settings.zoom_speed.value_or(FollowRequest().zoom_speed),
        .may_choose = !settings.as_set,
        .still = settings.still},
       watcher);

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <optional>
 #include <stdexcept>
 
 #include "host/stabilize/steady_clip.h"
@@ -12,6 +13,7 @@ struct WindowSettings {
   // where all that shape the path and its window are as they come.
   enum class Kind { by_controls, steady, follow } kind = Kind::by_controls;
   double most_zoom = 0;  // of a window that follows, which it asks for; 0: as Maximum Scale has it
+  std::optional<double> zoom_speed;  // of the same; none: as FollowRequest has it
   // Nothing is chosen: the controls as they are, and a window that follows only where it is asked
   // for.
   bool as_set = false;

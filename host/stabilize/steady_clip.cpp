@@ -435,7 +435,10 @@ Still SteadyClip::HeldOf(Still asked, const SolvedClip& solved) const {
 
 void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   DrawByItself();
-  if (!request.may_choose && choice_) {
+  const bool stands = choice_ && request.may_choose && choice_->most_zoom == request.most_zoom &&
+                      choice_->zoom_speed == request.zoom_speed &&
+                      (request.still == Still::automatic || request.still == choice_->still);
+  if (choice_ && !stands) {
     ForgetChoice();
     Work(watcher);
   }
@@ -443,11 +446,11 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   SolvedClip solved = Solved(*effect_, &saved, path());
   FollowSettings settings;
   settings.most_zoom = request.most_zoom;
+  settings.zoom_speed = request.zoom_speed;
+  settings.frames_per_second = FramesPerSecond();
   settings.enlarged = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
-  const bool stands = choice_ && request.may_choose && choice_->most_zoom == request.most_zoom &&
-                      (request.still == Still::automatic || request.still == choice_->still);
   if (stands) {
-    Chooser chooser(solved, settings, FramesPerSecond());
+    Chooser chooser(solved, settings);
     chooser.Take(*choice_, solved);
     return Draw(*choice_, chooser.windows(), std::move(saved), watcher);
   }
@@ -457,7 +460,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
     HoldStill(still, watcher);
     solved = Solved(*effect_, &saved, path());
   }
-  Chooser chooser(solved, settings, FramesPerSecond());
+  Chooser chooser(solved, settings);
   Progress progress{.stage = "choosing", .total = 1};
   watcher.Show(progress);
   chooser.Consider({.name = "as set"}, solved);
@@ -466,7 +469,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
     chooser.Consider({.name = "not bent", .warps = Warps::none}, solved, true);
   }
   if (request.may_choose && chooser.leaves_shake()) TryControls(chooser, watcher);
-  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed();
+  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved);
   choice_ = chooser.choice();
   has_new_choice_ = true;
   choice_->still = still;

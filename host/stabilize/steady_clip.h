@@ -38,7 +38,8 @@ enum class Opening { decoded, promised };
 
 // How a clip is to be shown by windows that follow its picture.
 struct FollowRequest {
-  double most_zoom = 1.5;  // each frame is enlarged at most so far
+  double most_zoom = 1.5;                           // each frame is enlarged at most so far
+  double zoom_speed = FollowSettings().zoom_speed;  // percent a second
   // Other controls than those that were set are tried as well, and the clip as it was filmed.
   bool may_choose = true;
   Still still = Still::automatic;

@@ -9,6 +9,8 @@
 #include <list>
 #include <mutex>
 #include <new>
+#include <stdexcept>
+#include <string_view>
 #include <thread>
 #include <utility>
 
@@ -16,6 +18,17 @@
 #include "platform/tessel/threads_internal.h"
 
 namespace tessel::threads {
+namespace {
+
+// A thread of the pool could not be started, for want of memory. The pool counts it all the same,
+// and whoever waits for its threads to leave waits for ever.
+std::atomic<bool> pool_lacks_a_thread = false;
+
+bool IsFailedStart(const std::runtime_error& error) {
+  return std::string_view(error.what()).starts_with("pthread_create");
+}
+
+}  // namespace
 
 void ExecuteCPUBoundTaskOnAllProcessors(const boost::function<void(std::size_t)>& task,
                                         std::size_t count) {
@@ -33,14 +46,19 @@ void ExecuteCPUBoundTaskOnAllProcessors(const boost::function<void(std::size_t)>
   };
   begun.store(true, std::memory_order_release);
   const Join join{ended};
-  tbb::parallel_for(
-      tbb::blocked_range<std::size_t>(0, count, 1),
-      [&](const tbb::blocked_range<std::size_t>& range) {
-        (void)begun.load(std::memory_order_acquire);
-        const End end{ended};
-        for (std::size_t i = range.begin(); i != range.end(); ++i) task(i);
-      },
-      tbb::simple_partitioner());
+  try {
+    tbb::parallel_for(
+        tbb::blocked_range<std::size_t>(0, count, 1),
+        [&](const tbb::blocked_range<std::size_t>& range) {
+          (void)begun.load(std::memory_order_acquire);
+          const End end{ended};
+          for (std::size_t i = range.begin(); i != range.end(); ++i) task(i);
+        },
+        tbb::simple_partitioner());
+  } catch (const std::runtime_error& error) {
+    if (IsFailedStart(error)) pool_lacks_a_thread = true;
+    throw;
+  }
 }
 
 struct ProcessorLimit::State {
@@ -130,6 +148,7 @@ LiveThreads& live_threads() {
 // The pool comes back with the next loop. Where another thread is still at a loop this waits for
 // nothing.
 void EndLoopThreads() {
+  if (pool_lacks_a_thread) return;
   tbb::task_scheduler_handle pool{tbb::attach{}};
   tbb::finalize(pool, std::nothrow);
 }

@@ -37,6 +37,7 @@ class WindowProgramme {
       programme.linear[IndexOf(f, kScale)] = -1000 / kEdge * weights.width;
     }
     AddCharges(weights, programme);
+    if (weights.growth > 0) AddGrowthCharges(weights.growth, programme);
     std::vector<double> found = host::Solve(programme, Start(largest));
     Keep(programme, largest, found);
     std::vector<Similarity> path(frames_.size());
@@ -127,6 +128,31 @@ class WindowProgramme {
           programme.charges.push_back(charge);
         }
       }
+    }
+  }
+
+  // By how much the scale of motion[f + 1] window[f + 1] is beyond that of window[f] over the
+  // growth that is allowed, upwards and downwards: max(0, z), as (z + |z|) / 2.
+  void AddGrowthCharges(double weight, BandProgramme& programme) const {
+    for (std::size_t f = 0; f + 1 < frames_.size(); ++f) {
+      const WindowFrame& next = frames_[f + 1];
+      const auto add = [&](double growth, double sign) {
+        if (!(growth > 0 && std::isfinite(growth))) return;
+        BandProgramme::Charge charge;
+        charge.row.first = IndexOf(f, 0);
+        charge.row.count = 2 * kUnknowns;
+        charge.row.coefficients[kScale] = -sign / growth;
+        charge.row.coefficients[kUnknowns + kScale] = sign * next.motion.a;
+        charge.row.coefficients[kUnknowns + kTurn] = -sign * next.motion.b;
+        charge.weight = weight / 2;
+        programme.charges.push_back(charge);
+        for (int i = 0; i < charge.row.count; ++i) {
+          programme.linear[static_cast<std::size_t>(charge.row.first + i)] +=
+              charge.weight * charge.row.coefficients[i];
+        }
+      };
+      add(next.least_growth, 1);
+      add(next.most_growth, -1);
     }
   }
 

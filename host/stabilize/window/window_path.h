@@ -1,5 +1,6 @@
 #pragma once
 
+#include <limits>
 #include <vector>
 
 #include "host/stabilize/similarity.h"
@@ -23,6 +24,10 @@ struct WindowFrame {
   // The window shows the plane this many times enlarged at most; above 0. Where no window that
   // large lies in the covered region, the largest that does counts.
   double most_zoom = 1;
+  // The output shows the background so many times as large as in the frame before, unless that
+  // would take a window outside of what is covered or a larger zoom. Of the first frame without
+  // meaning.
+  double least_growth = 0, most_growth = std::numeric_limits<double>::infinity();
 };
 
 // What is charged. Pixels of a picture 1000 wide, a frame; turning and zooming count as the motion
@@ -33,6 +38,9 @@ struct WindowWeights {
   // nobody sees is left for a wider window: found on clips of several kinds, where half and twice
   // as much moved the width by some hundredths.
   double width = 0.1;
+  // Growth beyond a frame's bounds. High enough that they hold wherever they can: on six filmed
+  // clips 100 and 3000 gave the same windows.
+  double growth = 300;
 };
 
 // The calmest path of a window of `width` x `height` that never leaves what is covered: one

@@ -150,7 +150,9 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
   };
   for (const Run& run : {Run{"", "by itself", 1.5}, Run{"--zoom-at-most 1.15", "limited", 1.15},
                          Run{"--smoothness 80 --window follow", "asked for", 1.5},
-                         Run{"--smoothness 20", "where the effect's own leaves black", 1.5}}) {
+                         Run{"--smoothness 20", "where the effect's own leaves black", 1.5},
+
+                         Run{"--smoothness 80 --zoom-speed 0", "zoomed once for all", 1.5}}) {
     const std::string told =
         RunWell("stabilize in.mkv out.mkv --codec ffv1 --overwrite " + run.flags);
     const std::size_t at = told.find("zoom ");
@@ -175,6 +177,18 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
   EXPECT_FALSE(content("") == content("--window steady"));
   ExpectLine("stabilize in.mkv x.mkv --quiet --window follow --framing stabilize-only", 2,
              "needs --framing crop-auto-scale");
+}
+
+// A camera on a tripod can't be calmed, and its frames come out whole, to their edges.
+TEST_F(ProgramTest, WhatNothingCalmsPassesThrough) {
+  MakeWall("in.mkv", Made(160, 120, 12, 25), [](double) { return Camera{}; });
+  EXPECT_THAT(RunWell("stabilize in.mkv out.mkv --codec ffv1 --quiet --json"),
+              HasSubstr("\"window\":\"none\""));
+  const auto in = ClipReader::Open(Path("in.mkv")), out = ClipReader::Open(Path("out.mkv"));
+  for (const int frame : {0, 11}) {
+    const auto a = ReadFrame(*in, frame), b = ReadFrame(*out, frame);
+    for (std::size_t i = 0; i < a.size(); ++i) ASSERT_NEAR(a[i].green, b[i].green, 3) << i;
+  }
 }
 
 TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {

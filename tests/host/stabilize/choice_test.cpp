@@ -13,10 +13,10 @@
 namespace calmframe::host {
 namespace {
 
-// Points of a flat scene that a shaking hand films, and warps that undo the shake but for `noise`
+// Points of a flat scene that a shaking hand films, and warps that undo its motion but for `noise`
 // pixels by which each vertex of each frame is off. Every fourth vertex of the noise has it alone,
-// so that no similarity undoes it.
-SolvedClip Filmed(double noise) {
+// so that no similarity undoes it. `growth`: by which the camera comes nearer from frame to frame.
+SolvedClip Filmed(double noise, double growth = 1) {
   constexpr int kFrames = 90, kSlots = 80;
   std::mt19937 random(6);
   std::uniform_real_distribution<double> even(-1, 1);
@@ -32,7 +32,9 @@ SolvedClip Filmed(double noise) {
     scene.push_back({200 + 180 * even(random), 150 + 130 * even(random)});
   }
   for (int f = 0; f < kFrames; ++f) {
-    const Similarity hand{1, 0.01 * even(random), 6 * even(random), 6 * even(random)};
+    const double near = std::pow(growth, f - kFrames / 2);
+    const Similarity hand{near, 0.01 * even(random), 6 * even(random) + 200 * (1 - near),
+                          6 * even(random) + 150 * (1 - near)};
     for (const Point& point : scene) {
       clip.tracks.push_back(hand(point));
       clip.statuses.push_back(f == 0 ? 1 : 0);
@@ -53,9 +55,9 @@ const Candidate kUnbent{.name = "unbent", .warps = Warps::none};
 // The best of these, in this order, and of the clip as it was filmed.
 Choice Best(const SolvedClip& clip, const std::vector<Candidate>& candidates,
             const FollowSettings& settings = {}) {
-  Chooser chooser(clip, settings, 30);
+  Chooser chooser(clip, settings);
   for (const Candidate& candidate : candidates) chooser.Consider(candidate, clip);
-  if (settings.enlarged == 1) chooser.ConsiderAsFilmed();
+  if (settings.enlarged == 1) chooser.ConsiderAsFilmed(clip);
   EXPECT_EQ(chooser.windows().size(), 90u);
   return chooser.choice();
 }
@@ -103,18 +105,37 @@ TEST(ChooserTest, AnEnlargementComesOnTop) {
   EXPECT_GT(Best(clip, {kBent}, settings).best().outcome.most_black, 0.2);
 }
 
+// 9 % a second, and the same with warps that take it away again.
+TEST(FollowWindowsTest, WhatTheCameraZoomsIsNoChangeOfZoom) {
+  const SolvedClip clip = Filmed(0, 1.003);
+  for (const Warps warps : {Warps::none, Warps::solved}) {
+    const WarpedPlane plane(clip, warps);
+    const PictureMotion motion = FindMotion(plane);
+    FollowSettings settings;
+    const auto most_change = [&](double speed) {
+      settings.zoom_speed = speed;
+      const ShownMotion shown = MotionShown(plane, motion, FollowWindows(plane, motion, settings));
+      const auto [least, most] = std::minmax_element(shown.zooms.begin(), shown.zooms.end());
+      return *most / *least;
+    };
+    EXPECT_LT(most_change(0), 1.002);
+    EXPECT_GT(most_change(1000), 1.01);
+  }
+}
+
 TEST(ChooserTest, ATextBringsTheChoiceBack) {
   const SolvedClip clip = Filmed(15);
-  Chooser first(clip, {}, 30);
+  Chooser first(clip, {.zoom_speed = 2.5});
   first.Consider(kBent, clip);
   first.Consider({.name = "calmer", .changes = {{20, 80}, {281, 0}}, .warps = Warps::none}, clip);
   const std::string text = first.choice().Json().dump();
   const std::optional<Choice> read = Choice::Parse(text);
   ASSERT_TRUE(read);
   EXPECT_EQ(read->taken, 1u);
+  EXPECT_EQ(read->zoom_speed, 2.5);
   EXPECT_EQ(read->best().changes, (ParamValues{{20, 80}, {281, 0}}));
   EXPECT_EQ(read->Json().dump(), text);
-  Chooser again(clip, {}, 30);
+  Chooser again(clip, {.zoom_speed = 2.5});
   again.Take(*read, clip);
   ASSERT_EQ(again.windows().size(), first.windows().size());
   for (std::size_t f = 0; f < first.windows().size(); ++f) {

@@ -92,6 +92,8 @@ TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
     again.FollowPicture({.most_zoom = 1.1}, later);
     EXPECT_EQ(later.stages.back(), "choosing") << "of another request";
     EXPECT_LE(again.Measure().most_zoom, 1.1 + 1e-3);
+    again.FollowPicture({.most_zoom = 1.1, .zoom_speed = 0}, later);
+    EXPECT_EQ(again.choice()->zoom_speed, 0) << "of another request, too";
   }
   // As if Smoothness had been chosen: who sets another control has it back as it was given.
   auto made = nlohmann::json::parse(chosen);
@@ -99,6 +101,12 @@ TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
   for (auto& candidate : made["candidates"]) candidate["changes"]["20"] = 80;
   saved.effect.values[HX_SMOOTHNESS.disk_id] = 80;
   saved.choice = made.dump();
+  {
+    SteadyClip again(CALMFRAME_PLUGIN, saved, path_);
+    again.Work(later);
+    again.FollowPicture({.zoom_speed = 0}, later);
+    EXPECT_NE(again.ValueOf(HX_SMOOTHNESS.disk_id), 80) << "as does another request";
+  }
   SteadyClip clip(CALMFRAME_PLUGIN, saved, path_);
   clip.SetControls({{HX_METHOD.disk_id, 2}});
   EXPECT_EQ(clip.ValueOf(HX_SMOOTHNESS.disk_id), 50);

@@ -24,6 +24,8 @@ std::vector<WindowFrame> Walk(std::size_t frames, double shake, double most_zoom
     frame.covered = {{1, 0, kWide / 2}, {-1, 0, kWide / 2}, {0, 1, kHigh / 2}, {0, -1, kHigh / 2}};
     frame.motion = {1 + step(random) / 1000, step(random) / 400, step(random), step(random)};
     frame.most_zoom = most_zoom;
+    frame.least_growth = 0.998;
+    frame.most_growth = 1.003;
   }
   return walk;
 }
@@ -46,13 +48,16 @@ double Outside(const WindowFrame& frame, const Similarity& window) {
 double ChargeOf(const std::vector<WindowFrame>& frames, const std::vector<Similarity>& path,
                 const WindowWeights& weights) {
   const double thousandth = kWide / 1000;
+  double charge = 0;
   std::vector<std::vector<double>> motions;
   for (std::size_t f = 0; f + 1 < path.size(); ++f) {
     const Similarity next = Compose(frames[f + 1].motion, path[f + 1]);
+    charge += weights.growth * 500 *
+              (std::max(0.0, next.a - path[f].a / frames[f + 1].least_growth) +
+               std::max(0.0, path[f].a / frames[f + 1].most_growth - next.a));
     motions.push_back({(next.dx - path[f].dx) / thousandth, (next.dy - path[f].dy) / thousandth,
                        (next.a - path[f].a) * 500, (next.b - path[f].b) * 500});
   }
-  double charge = 0;
   for (const double weight : {weights.motion, weights.change, weights.jerk}) {
     for (const auto& motion : motions) {
       for (const double value : motion) charge += weight * std::abs(value);
@@ -119,6 +124,42 @@ TEST(WindowPathTest, WhereTheZoomIsTooLittleTheLargestWindowCounts) {
   EXPECT_NEAR(path[20].a, 1 / 3.0, 0.005);
   EXPECT_LE(Outside(frames[20], path[20]), 1e-6);
   EXPECT_GE(path[0].a, 1 / 1.5 - 1e-6);
+}
+
+// The picture is smaller from frame 100 to 125 of 250.
+TEST(WindowPathTest, TheZoomChangesNoFasterThanItMayUnlessItMust) {
+  struct Dip {
+    const char* what;
+    double depth, most_zoom;
+    double camera, speed;   // growth of a frame, as logarithms
+    int faster;             // frames
+    double before, within;  // the window's scale in frames 0 and 112
+  };
+  // To 0.9 at 0.002 takes 53 frames. No window may be smaller than 0.8 beside one of 0.6.
+  for (const Dip& c : {Dip{"room on both sides", 0.9, 1.5, 0, 0.002, 0, 1, 0.9},
+                       Dip{"no time", 0.8, 1.25, 0, 0, 0, 0.8, 0.8},
+                       Dip{"the camera zooms", 0.9, 1.5, 0.004, 0, 0, 0.9, 0.9},
+                       Dip{"no room", 0.6, 1.25, 0, 0.002, 2, 1, 0.6}}) {
+    std::vector<WindowFrame> frames = Walk(250, 0, c.most_zoom);
+    for (std::size_t f = 0; f < frames.size(); ++f) {
+      if (f >= 100 && f < 125) {
+        for (HalfPlane& side : frames[f].covered) side.limit *= c.depth;
+      }
+      frames[f].motion.a = std::exp(-c.camera);
+      frames[f].least_growth = std::exp(c.camera - c.speed);
+      frames[f].most_growth = std::exp(c.camera + c.speed);
+    }
+    const std::vector<Similarity> path = FindWindowPath(kWide, kHigh, frames, {});
+    int faster = 0;
+    for (std::size_t f = 0; f + 1 < path.size(); ++f) {
+      faster += std::abs(std::log(path[f + 1].a / path[f].a)) > c.speed + 1e-5;
+      ASSERT_LE(Outside(frames[f], path[f]), 1e-6) << c.what << ", frame " << f;
+      ASSERT_GE(path[f].a, std::min(1 / c.most_zoom, 0.995 * c.depth) - 1e-6) << c.what;
+    }
+    EXPECT_EQ(faster, c.faster) << c.what;
+    EXPECT_NEAR(path[0].a, c.before, 0.03) << c.what;
+    EXPECT_NEAR(path[112].a, c.within, 0.03) << c.what;
+  }
 }
 
 TEST(WindowPathTest, ASlowPanIsFollowedWithoutShake) {
