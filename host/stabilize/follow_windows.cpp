@@ -98,7 +98,7 @@ std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom) {
 }
 
 std::vector<Similarity> WholeFrames(const SolvedClip& clip) {
-  constexpr double kInside = 1.0 / 64;  // warps are kept in steps of 1 / 256
+  constexpr double kInside = 1.0 / 128;  // warps are kept in steps of 1 / 256
   const double scale = 1 - 2 * kInside / std::min(clip.width, clip.height);
   const Point middle = Middle(clip);
   const Similarity window{scale, 0, middle.x * (1 - scale), middle.y * (1 - scale)};

@@ -181,13 +181,22 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
 
 // A camera on a tripod can't be calmed, and its frames come out whole, to their edges.
 TEST_F(ProgramTest, WhatNothingCalmsPassesThrough) {
-  MakeWall("in.mkv", Made(160, 120, 12, 25), [](double) { return Camera{}; });
+  media::EncodeSettings lossless;
+  lossless.codec = "ffv1";
+  lossless.pixel_format = "yuv444p";
+  MakeWall(
+      "in.mkv", Made(160, 120, 12, 25), [](double) { return Camera{}; }, lossless);
   EXPECT_THAT(RunWell("stabilize in.mkv out.mkv --codec ffv1 --quiet --json"),
               HasSubstr("\"window\":\"none\""));
   const auto in = ClipReader::Open(Path("in.mkv")), out = ClipReader::Open(Path("out.mkv"));
   for (const int frame : {0, 11}) {
     const auto a = ReadFrame(*in, frame), b = ReadFrame(*out, frame);
-    for (std::size_t i = 0; i < a.size(); ++i) ASSERT_NEAR(a[i].green, b[i].green, 3) << i;
+    double off = 0;
+    for (std::size_t i = 0; i < a.size(); ++i) {
+      ASSERT_NEAR(a[i].green, b[i].green, 8) << i;
+      off += std::abs(a[i].green - b[i].green);
+    }
+    EXPECT_LT(off / static_cast<double>(a.size()), 0.5);
   }
 }
 
