@@ -196,7 +196,7 @@ TEST_F(ProgramTest, WhatNothingCalmsPassesThrough) {
       ASSERT_NEAR(a[i].green, b[i].green, 8) << i;
       off += std::abs(a[i].green - b[i].green);
     }
-    EXPECT_LT(off / static_cast<double>(a.size()), 0.5);
+    EXPECT_LT(off / static_cast<double>(a.size()), 1.5);  // rounded to YUV twice
   }
 }
 
