@@ -7,6 +7,7 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/stabilize_command.h"
+#include "host/stabilize/framing.h"
 #include "host/stabilize/steady_clip.h"
 #include "platform/tessel/threads.h"
 
@@ -15,9 +16,11 @@ namespace calmframe {
 AnalyzeCommand::AnalyzeCommand(CLI::App& program)
     : Command(AddCommand(
           program, "analyze",
-          "Tell what would become of a clip, without rendering it\n\n"
-          "Prints the crop window and how far it is enlarged. With --project, stabilize and render "
-          "go on from there.",
+          "Analyse and solve a clip, without rendering it\n\n"
+          "Prints the effect's own crop window and how far it is enlarged. What follows the "
+          "picture "
+          "in its place is found by stabilize, and shown by report. With --project, these and "
+          "render go on from there.",
           "Examples:\n"
           "  calmframe analyze shaky.mp4\n"
           "  calmframe analyze shaky.mp4 --project shaky.calm --smoothness 20")) {
@@ -42,7 +45,9 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
   const media::ClipInfo& info = clip.info();
   if (!info.warning.empty()) progress.Warn(info.warning);
   const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
-  TellTrouble(host::CropTroubleOf(clip), clip, progress);
+  // The effect's own window is no trouble where it isn't what is shown.
+  const bool follows = host::Follows(clip, {});
+  if (!follows) TellTrouble(host::CropTroubleOf(clip), clip, progress);
   if (run_.json) {
     const std::unique_ptr<host::CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;
@@ -59,7 +64,9 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
   }
   std::printf("%s: %zu %s of %dx%d\n", input_.c_str(), info.frame_count,
               info.frame_count == 1 ? "frame" : "frames", info.width, info.height);
-  if (const std::string text = clip.CropText(); !text.empty()) std::printf("%s\n", text.c_str());
+  if (const std::string text = clip.CropText(); !text.empty()) {
+    std::printf("%s%s\n", text.c_str(), follows ? ", with --window steady" : "");
+  }
   unsaved.Throw();
 }
 

@@ -3,6 +3,7 @@
 #include <cstdio>
 #include <memory>
 #include <nlohmann/json.hpp>
+#include <optional>
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
@@ -11,6 +12,7 @@
 #include "apps/calmframe/track_export.h"
 #include "host/media/output_file.h"
 #include "host/project/project_file.h"
+#include "host/stabilize/choice.h"
 #include "host/stabilize/steady_clip.h"
 #include "platform/tessel/threads.h"
 
@@ -88,6 +90,7 @@ void InfoCommand::Run() {
   } catch (const host::ProjectFailure& failure) {
     trouble = failure.what();
   }
+  const std::optional<host::Choice> choice = host::Choice::Parse(project.choice);
   const double rate =
       static_cast<double>(HX_TICKS_PER_SECOND) / static_cast<double>(project.ticks_per_frame);
   if (json_) {
@@ -101,6 +104,7 @@ void InfoCommand::Run() {
     json["frames"] = project.length;
     json["rate"] = rate;
     json["instance_bytes"] = project.effect.instance.size();
+    if (choice) json["choice"] = choice->Json();
     std::printf("%s\n", JsonLine(json).c_str());
     return;
   }
@@ -108,6 +112,9 @@ void InfoCommand::Run() {
               clip.empty() ? project.clip_path.c_str() : clip.c_str(), project.length,
               project.width, project.height, project.start_frame, rate,
               project.effect.instance.size());
+  if (choice) {
+    std::printf("%s: %s\n", choice->Text().c_str(), choice->best().outcome.Text().c_str());
+  }
   std::printf("%s\n", trouble.empty() ? "the clip is the one that was analysed" : trouble.c_str());
 }
 

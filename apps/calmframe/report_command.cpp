@@ -18,6 +18,7 @@
 #include "apps/report/model_scores.h"
 #include "apps/report/page.h"
 #include "apps/report/plot.h"
+#include "apps/report/shown_section.h"
 #include "apps/report/solve_figures.h"
 #include "apps/report/solve_section.h"
 #include "host/effects/param_table.h"
@@ -143,13 +144,16 @@ ReportCommand::ReportCommand(CLI::App& program)
     : Command(AddCommand(
           program, "report",
           "Show saved work as a page\n\n"
-          "Camera path before and after, tracks, models, crop, what is left empty, and a "
-          "filmstrip, in one file for any browser. Where the clip is gone the page has all but the "
+          "What stabilize shows of it with the same flags of the window: what was chosen, of what, "
+          "and why, the window's path, the camera path before and after, tracks, models, what is "
+          "left empty, and a filmstrip, in one file for any browser. Where the clip is gone the "
+          "page has all but the "
           "filmstrip. Work is saved by stabilize and analyze with --project.",
           "Examples:\n"
           "  calmframe report shaky.calm report.html")) {
   AddFile(parser_, "PROJECT", project_, "The saved work");
   AddFile(parser_, "OUT", output_, "The page to write, .html");
+  AddWindowFlags(parser_, window_);
   PutInGroup("Output",
              {AddSwitch(parser_, "--overwrite", overwrite_, "Replace OUT where it exists")});
   AddRunFlags(parser_, run_);
@@ -187,28 +191,54 @@ void ReportCommand::Run() {
   {
     const report::SolveLog solve_log;
     const bool saved = clip->Work(progress).solve;
-    const std::string crop = clip->CropText();
-    const host::CropTrouble trouble = host::CropTroubleOf(*clip);
-    page.lead = trouble.kind == host::CropTrouble::Kind::nothing_seen
-                    ? "Not steadied: nothing stays in view"
-                : crop.empty() ? "Steadied, the whole frame kept"
-                               : "Steadied: " + crop;
+    const host::CropTrouble trouble = Choose(*clip, window_, progress);
+    const bool nothing_seen = trouble.kind == host::CropTrouble::Kind::nothing_seen;
     note(TroubleText(trouble, *clip));
+    const host::Choice* const choice = clip->choice();
+    report::SolveFigures figures = FiguresOf(*clip);
+    host::ShownPath path;
+    if (choice) {
+      path = clip->Path();
+      figures.before = report::MotionsOf(path.source);
+      figures.after = report::MotionsOf(path.output);
+      figures.window.clear();  // the effect's own, which is not shown
+      report::AddChoice(*choice, page);
+    } else {
+      const std::string crop = clip->CropText();
+      page.lead = nothing_seen   ? "Not steadied: nothing stays in view"
+                  : crop.empty() ? "Steadied, the whole frame kept"
+                                 : "Steadied: " + crop;
+      if (!nothing_seen && !crop.empty()) {
+        page.shown.words = {"The effect's own crop window: " + clip->Measure().Text() + "."};
+      }
+    }
     page.controls = ControlsOf(*clip);
-    const report::SolveFigures figures = FiguresOf(*clip);
     const std::size_t rows = std::max<std::size_t>(figures.tracked.size(), 1);
     page.seconds_a_value = static_cast<double>(info.frame_count) / rate / static_cast<double>(rows);
     std::vector<report::FilmFrame> film = Moments(info);
     std::vector<std::string> said;
     const std::vector<double> empty = Draw(*clip, run_.threads, progress, film, said);
     for (const std::string& line : said) {
-      if (trouble.kind != host::CropTrouble::Kind::nothing_seen) note(line);
+      if (!nothing_seen) note(line);
     }
     if (gone.empty()) page.film = std::move(film);
     // Saved work doesn't keep how the models were chosen: a solve of the same tells it again. It
     // comes last, since tracks are saved in steps of 1/32 pixel, which moves its warps a little.
-    if (saved) clip->SolveAnew(progress);
-    report::AddSolve(figures, solve_log.Scores(rows), page);
+    std::vector<double> scores;
+    if (!choice || (choice->best().follows && choice->best().outcome.bends)) {
+      if (saved || choice) clip->SolveAnew(progress);
+      scores = solve_log.Scores(rows);
+    }
+    report::AddCameraPath(figures, page);
+    if (choice) {
+      const host::Outcome& outcome = choice->best().outcome;
+      report::NoteWhatIsLeft(outcome.before.mean, outcome.after.mean, host::ChoiceWeights().seen,
+                             figures, page);
+      report::AddWindows(path, page);
+    } else {
+      report::AddShake(figures, page);
+    }
+    report::AddSolve(figures, scores, page);
     report::AddEmptyShares(empty, rows, page);
     if (rows < 2) page.plots.clear();  // of points nothing can be read
   }

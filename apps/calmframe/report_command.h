@@ -19,6 +19,7 @@ class ReportCommand final : public Command {
  private:
   std::string project_, output_;
   bool overwrite_ = false;
+  host::WindowSettings window_;
   RunFlags run_;
 };
 

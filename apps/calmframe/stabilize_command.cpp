@@ -55,13 +55,18 @@ void TellTrouble(const host::CropTrouble& trouble, const host::SteadyClip& clip,
   if (!line.empty()) progress.Warn(line);
 }
 
-void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressLine& progress) {
+host::CropTrouble Choose(host::SteadyClip& clip, const host::WindowSettings& window,
+                         ProgressLine& progress) {
   try {
-    TellTrouble(host::ChooseFraming(clip, window, progress), clip, progress);
+    return host::ChooseFraming(clip, window, progress);
   } catch (const host::WindowRefused&) {
     throw UsageFailure(
         "a window that follows the picture needs --framing crop-auto-scale and no margin");
   }
+}
+
+void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressLine& progress) {
+  TellTrouble(Choose(clip, window, progress), clip, progress);
 }
 
 void TellOutcome(host::SteadyClip& clip, ProgressLine& progress) {
@@ -89,42 +94,46 @@ void AddRunFlags(CLI::App& command, RunFlags& flags) {
   PutInGroup("Running", {threads, quiet, json});
 }
 
-void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
-  CLI::Option* const window = AddChoice(
+void AddWindowFlags(CLI::App& command, host::WindowSettings& window) {
+  CLI::Option* const kind = AddChoice(
       command, "--window",
-      [&flags](const std::string& name) {
-        flags.window.kind = name == "follow" ? host::WindowSettings::Kind::follow
-                                             : host::WindowSettings::Kind::steady;
+      [&window](const std::string& name) {
+        window.kind = name == "follow" ? host::WindowSettings::Kind::follow
+                                       : host::WindowSettings::Kind::steady;
       },
       {"follow", "steady"},
       "What of each frame is shown: a part that follows the picture, which leaves nothing black "
-      "and "
-      "enlarges no further than it may; or the effect's own window. At first the one that follows, "
+      "and enlarges no further than it may; or the effect's own window. At first the one that "
+      "follows, "
       "unless --smoothness, --crop-less-smooth-more, --result or --framing are set");
   CLI::Option* const zoom = AddNumber<double>(
-      command, "--zoom-at-most", [&flags](double most) { flags.window.most_zoom = most; }, "ZOOM",
-      1, 100, "How far a window that follows may enlarge; at first as far as --maximum-scale, 1.5");
+      command, "--zoom-at-most", [&window](double most) { window.most_zoom = most; }, "ZOOM", 1,
+      100, "How far a window that follows may enlarge; at first as far as --maximum-scale, 1.5");
   CLI::Option* const zoom_speed = AddNumber<double>(
-      command, "--zoom-speed", [&flags](double speed) { flags.window.zoom_speed = speed; },
-      "PERCENT", 0, 1000,
+      command, "--zoom-speed", [&window](double speed) { window.zoom_speed = speed; }, "PERCENT", 0,
+      1000,
       "How fast a window that follows may change its zoom, in percent a second, beside what the "
       "camera itself does; more only where nothing else keeps black out of the picture");
   TellDefault(*zoom_speed, "5");
   CLI::Option* const steady = AddChoice(
       command, "--steady",
-      [&flags](const std::string& name) {
-        flags.window.still = name == "background" ? host::Still::background
-                             : name == "subject"  ? host::Still::subject
-                                                  : host::Still::automatic;
+      [&window](const std::string& name) {
+        window.still = name == "background" ? host::Still::background
+                       : name == "subject"  ? host::Still::subject
+                                            : host::Still::automatic;
       },
       {"auto", "background", "subject"},
       "What is to stand still where somebody near moves against what is behind: the background, or "
       "that subject. At first the background, where it fills enough of the frame");
   CLI::Option* const as_set = AddSwitch(
-      command, "--as-set", flags.window.as_set,
+      command, "--as-set", window.as_set,
       "Choose nothing for the clip: the controls as they are set, or as they come, and the "
       "effect's own window");
-  PutInGroup("Window", {window, zoom, zoom_speed, steady, as_set});
+  PutInGroup("Window", {kind, zoom, zoom_speed, steady, as_set});
+}
+
+void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
+  AddWindowFlags(command, flags.window);
   CLI::Option* const crf = AddNumber<int>(
       command, "--crf", [&flags](int value) { flags.encode.crf = value; }, "N", 0, 63,
       "How much the encoder may lose: less looks better and makes larger files");

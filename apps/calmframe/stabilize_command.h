@@ -29,6 +29,9 @@ struct RunFlags {
 };
 void AddRunFlags(CLI::App& command, RunFlags& flags);
 
+// Adds the flags for what of each frame is shown.
+void AddWindowFlags(CLI::App& command, host::WindowSettings& window);
+
 // How the result is framed and written.
 struct OutputFlags {
   host::WindowSettings window;
@@ -62,8 +65,12 @@ std::string TroubleText(const host::CropTrouble& trouble, const host::SteadyClip
 void TellTrouble(const host::CropTrouble& trouble, const host::SteadyClip& clip,
                  ProgressLine& progress);
 
-// After the clip's work: chooses what is shown of it, and tells what there is to tell of that.
-// Throws SolveFailure, UsageFailure, Interrupted.
+// After the clip's work: as host::ChooseFraming, with the flags' own words where they can't be had
+// together. Throws UsageFailure, SolveFailure, Interrupted.
+[[nodiscard]] host::CropTrouble Choose(host::SteadyClip& clip, const host::WindowSettings& window,
+                                       ProgressLine& progress);
+
+// The same, and tells what there is to tell of that, by TellTrouble.
 void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressLine& progress);
 
 // What came out of it, behind all else that a run says.

@@ -93,6 +93,16 @@ std::optional<FrameMotion> FitMotion(std::span<const Match> matches, Point centr
                      std::hypot(similarity.a, similarity.b)};
 }
 
+std::vector<std::optional<FrameMotion>> MotionsOf(const host::ShownMotion& shown) {
+  std::vector<std::optional<FrameMotion>> motions;
+  for (std::size_t f = 1; f < shown.motions.size(); ++f) {
+    const host::Similarity forth = host::Inverse(shown.motions[f]);  // from the frame before
+    motions.push_back(FrameMotion{forth.dx / shown.zooms[f], forth.dy / shown.zooms[f],
+                                  std::atan2(forth.b, forth.a), std::hypot(forth.a, forth.b)});
+  }
+  return motions;
+}
+
 std::vector<CameraPlace> PathOf(std::span<const std::optional<FrameMotion>> motions) {
   std::vector<CameraPlace> path(1);
   for (const std::optional<FrameMotion>& motion : motions) {

@@ -4,6 +4,7 @@
 #include <span>
 #include <vector>
 
+#include "host/stabilize/measures.h"
 #include "host/stabilize/similarity.h"
 
 namespace calmframe::report {
@@ -26,6 +27,10 @@ struct FrameMotion {
 // (1974) of the residuals over their median until it stands. Null with fewer than 3 matches and
 // where they lie on one point.
 std::optional<FrameMotion> FitMotion(std::span<const Match> matches, Point centre);
+
+// Of the background, from each frame to the next; in pixels of the source, so that what is enlarged
+// moves as far as what is not.
+std::vector<std::optional<FrameMotion>> MotionsOf(const host::ShownMotion& shown);
 
 // Where the camera points, summed up from the first frame on: the opposite of how the picture
 // moves.

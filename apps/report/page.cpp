@@ -35,15 +35,31 @@ figcaption p { flex-basis: 100%; }
 .key output { font-variant-numeric: tabular-nums; margin-left: 6px; color: var(--ink); }
 .k0 { color: var(--c0); } .k1 { color: var(--c1); } .k2 { color: var(--c2); }
 .k0 i { border-top-style: dashed; }
+.key.shade { color: var(--soft); }
+.key.shade i { height: 10px; border: 0; background: var(--c2); opacity: .3; }
 svg.plot { display: block; width: 100%; height: auto; touch-action: pan-y; }
 svg text { font-size: 11px; fill: var(--soft); }
 svg .y { text-anchor: end; dominant-baseline: middle; }
-svg .x { text-anchor: middle; }
+svg .x, svg .axis { text-anchor: middle; }
 svg .grid, svg .tick { stroke: var(--line); }
 svg .curve { fill: none; stroke-linejoin: round; stroke-linecap: round; stroke-width: 1.4; vector-effect: non-scaling-stroke; }
 svg .c0 { stroke: var(--c0); stroke-dasharray: 4 2.5; } svg .c1 { stroke: var(--c1); stroke-width: 2.2; } svg .c2 { stroke: var(--c2); }
 svg .alone { stroke-dasharray: none; stroke: var(--c1); stroke-width: 1.8; }
 svg .cursor { stroke: var(--soft); display: none; }
+svg.scatter { display: block; width: 100%; height: auto; }
+svg .band { fill: var(--c2); fill-opacity: .16; stroke: var(--c2); stroke-opacity: .4; }
+svg .dot { fill: var(--card); stroke: var(--c0); stroke-width: 2; }
+svg circle.marked { fill: var(--c1); }
+svg .name { dominant-baseline: central; fill: var(--ink); }
+svg .name.marked { font-weight: 600; }
+.words { max-width: 85ch; margin: 0 0 10px; }
+.wide { overflow-x: auto; margin: 14px 0 16px; }
+.ways th { white-space: nowrap; width: auto; overflow-wrap: normal; }
+.ways thead th { vertical-align: bottom; white-space: normal; font-size: 13.5px; }
+.ways td, .ways thead th + th { text-align: right; white-space: nowrap; }
+.ways tbody tr:first-child > * { border-top: 1px solid var(--line); }
+.ways .taken > * { color: var(--ink); font-weight: 600; background: rgb(0 114 178 / 10%); }
+.ways mark { background: var(--c1); color: var(--card); border-radius: 9px; padding: 1px 8px; margin-left: 8px; font-size: 12px; font-weight: 400; }
 .film { display: grid; grid-template-columns: repeat(auto-fill, minmax(min(300px, 46%), 1fr)); gap: 14px; }
 .film figure { padding: 8px; margin: 0; }
 .film div { position: relative; margin-top: 4px; }
@@ -51,7 +67,7 @@ svg .cursor { stroke: var(--soft); display: none; }
 .film span { position: absolute; left: 6px; bottom: 6px; padding: 0 7px; border-radius: 9px; background: rgb(0 0 0 / 60%); color: #fff; font-size: 12px; line-height: 18px; }
 .film figcaption { margin: 0; color: var(--soft); }
 footer { color: var(--soft); font-size: 13px; margin-top: 40px; }
-@media (max-width: 640px) { svg.plot { overflow: visible; margin-bottom: 6px; } svg text { font-size: 23px; } svg .x { transform: translateY(9px); } }
+@media (max-width: 640px) { svg.plot { overflow: visible; margin-bottom: 6px; } svg text { font-size: 23px; } svg .x { transform: translateY(9px); } svg.scatter text { font-size: 16px; } svg.scatter .x { transform: none; } }
 @media print { :root { color-scheme: light; --back: #fff; } body { max-width: none; padding: 0; } h2 { break-after: avoid; } section.cards { break-inside: avoid; } }
 </style>
 )html";
@@ -109,8 +125,45 @@ std::string FigureOf(const Plot& plot, double seconds_a_value) {
     html += "<span class=\"key k" + std::to_string(alone ? 1 : c) + "\"><i></i>" +
             Escaped(plot.curves[c].name) + "<output></output></span>";
   }
+  if (!plot.band.name.empty()) {
+    html += "<span class=\"key shade\"><i></i>" + Escaped(plot.band.name) + "</span>";
+  }
   html += "<p>" + Escaped(plot.about) + "</p></figcaption>\n";
   return html + SvgOf(plot, seconds_a_value) + "</figure>\n";
+}
+
+std::string TableOf(const Shown::Ways& ways) {
+  std::string html = "<div class=\"wide\"><table class=\"ways\">\n<thead><tr>";
+  for (const std::string& column : ways.columns) {
+    html += "<th scope=\"col\">" + Escaped(column) + "</th>";
+  }
+  html += "</tr></thead>\n<tbody>\n";
+  for (std::size_t r = 0; r < ways.rows.size(); ++r) {
+    const bool taken = r == ways.taken;
+    html += taken ? "<tr class=\"taken\">" : "<tr>";
+    for (std::size_t c = 0; c < ways.rows[r].size(); ++c) {
+      const std::string cell = Escaped(ways.rows[r][c]);
+      if (c > 0) {
+        html += "<td>" + cell + "</td>";
+        continue;
+      }
+      html += "<th scope=\"row\">" + cell + (taken ? "<mark>chosen</mark>" : "") + "</th>";
+    }
+    html += "</tr>\n";
+  }
+  return html + "</tbody>\n</table></div>\n";
+}
+
+std::string SectionOf(const Shown& shown) {
+  std::string html = "<h2>What is shown</h2>\n";
+  for (const std::string& words : shown.words) {
+    html += "<p class=\"words\">" + Escaped(words) + "</p>\n";
+  }
+  if (shown.ways.rows.empty()) return html;
+  const Scatter& scatter = shown.scatter;
+  return html + TableOf(shown.ways) + "<figure><figcaption><b>" + Escaped(scatter.title) +
+         "</b><p>" + Escaped(scatter.about) + "</p></figcaption>\n" + SvgOf(scatter) +
+         "</figure>\n";
 }
 
 // With its name on it.
@@ -124,6 +177,18 @@ double Rounded(double value) {
   return std::round(value * 1000) / 1000;
 }
 
+nlohmann::ordered_json Values(const std::vector<double>& values) {
+  auto array = nlohmann::ordered_json::array();
+  for (const double value : values) {
+    if (std::isfinite(value)) {
+      array.push_back(Rounded(value));
+    } else {
+      array.push_back(nullptr);
+    }
+  }
+  return array;
+}
+
 std::string DataOf(const Page& page) {
   nlohmann::ordered_json json;
   json["seconds_a_value"] = page.seconds_a_value;
@@ -132,16 +197,9 @@ std::string DataOf(const Page& page) {
     auto& entry = json["plots"][plot.id];
     entry["unit"] = plot.unit;
     entry["curves"] = nlohmann::ordered_json::object();
-    for (const Curve& curve : plot.curves) {
-      auto& values = entry["curves"][curve.name] = nlohmann::ordered_json::array();
-      for (const double value : curve.values) {
-        if (std::isfinite(value)) {
-          values.push_back(Rounded(value));
-        } else {
-          values.push_back(nullptr);
-        }
-      }
-    }
+    for (const Curve& curve : plot.curves) entry["curves"][curve.name] = Values(curve.values);
+    if (plot.band.name.empty()) continue;
+    entry["band"] = {{"least", Values(plot.band.least)}, {"most", Values(plot.band.most)}};
   }
   std::string text = json.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
   // Nothing in it may end the element.
@@ -166,6 +224,7 @@ std::string HtmlOf(const Page& page) {
   }
   html += "<section class=\"cards\">\n" + TableOf("In figures", page.facts) +
           TableOf("Controls", page.controls) + "</section>\n";
+  if (!page.shown.words.empty()) html += SectionOf(page.shown);
   if (!page.film.empty()) {
     html += "<h2>Before and after</h2>\n<section class=\"film\">\n";
     for (const FilmFrame& moment : page.film) {

@@ -19,13 +19,25 @@ struct FilmFrame {
   std::string before, after;
 };
 
+// What was chosen of the clip to show.
+struct Shown {
+  std::vector<std::string> words;  // a paragraph each; none: the page doesn't tell of it
+  struct Ways {                    // those that were tried, a row each
+    std::vector<std::string> columns;
+    std::vector<std::vector<std::string>> rows;  // a cell a column; none: no table and no dots
+    std::size_t taken = 0;                       // of the rows
+  } ways;
+  Scatter scatter;
+};
+
 struct Page {
   std::string title;               // the clip's name
   std::string lead;                // the result in one line
   std::vector<Fact> facts;         // of the clip and what became of it
   std::vector<Fact> controls;      // that it was made with
   std::vector<std::string> notes;  // what the reader should know, a sentence each
-  std::string plots_about;         // what holds for several of the plots
+  Shown shown;
+  std::string plots_about;  // what holds for several of the plots
   std::vector<Plot> plots;
   double seconds_a_value = 1;  // of all curves
   std::vector<FilmFrame> film;

@@ -24,43 +24,6 @@ std::string Percent(double share, int digits) {
   return Short(100 * share, digits) + " %";
 }
 
-void AddPath(const SolveFigures& figures, Page& page) {
-  const std::vector<CameraPlace> before = PathOf(figures.before), after = PathOf(figures.after);
-  const auto add = [&](const char* id, const char* title, const char* unit, const char* about,
-                       double least_span, double CameraPlace::*axis) {
-    page.plots.push_back({id,
-                          title,
-                          unit,
-                          about,
-                          {{"as shot", Column(before, axis)}, {"steadied", Column(after, axis)}},
-                          least_span});
-  };
-  page.plots_about =
-      "The camera path is summed up from frame to frame: the shift, turn and size that most tracks "
-      "agree on. Pixels are the clip's own, before anything is enlarged.";
-  add("path-x", "Camera path, across", "px", "Where the camera points, to the right.", 4,
-      &CameraPlace::x);
-  add("path-y", "Camera path, down", "px", "Where the camera points, downwards.", 4,
-      &CameraPlace::y);
-  add("path-angle", "Camera path, turn", "degrees", "How the camera is turned, clockwise.", 0.4,
-      &CameraPlace::angle);
-  add("path-zoom", "Camera path, closeness", "times",
-      "How close the camera is to what it shows, 1 at first.", 0.02, &CameraPlace::zoom);
-
-  const double shake = ShakeOf(before), left = ShakeOf(after);
-  page.facts.push_back({"Shake", Short(shake, 2) + " px/" + figures.row + "² as shot, " +
-                                     Short(left, 2) + " steadied"});
-  constexpr double kHardly = 0.75;  // of the shake, left
-  constexpr double kSeen = 0.3;     // px/frame²; less is a still camera
-  if (shake > kSeen && left > kHardly * shake) {
-    page.notes.push_back(
-        "Hardly steadier than it was shot. Half of its tracks last " +
-        std::to_string(figures.track_life) + " " + figures.row +
-        "s or fewer: where they are short, as in quick pans and blur, or where someone near "
-        "moves against the scene, little can be smoothed.");
-  }
-}
-
 void AddTracks(const SolveFigures& figures, Page& page) {
   page.plots.push_back(
       {"tracks",
@@ -116,15 +79,60 @@ void AddCrop(const SolveFigures& figures, Page& page) {
 
 }  // namespace
 
+void AddCameraPath(const SolveFigures& figures, Page& page) {
+  if (figures.track_life == 0) return;
+  const std::vector<CameraPlace> before = PathOf(figures.before), after = PathOf(figures.after);
+  const auto add = [&](const char* id, const char* title, const char* unit, const char* about,
+                       double least_span, double CameraPlace::*axis) {
+    page.plots.push_back({id,
+                          title,
+                          unit,
+                          about,
+                          {{"as shot", Column(before, axis)}, {"steadied", Column(after, axis)}},
+                          least_span});
+  };
+  page.plots_about =
+      "The camera path is summed up from frame to frame: the shift, turn and size that most tracks "
+      "agree on. Pixels are the clip's own, before anything is enlarged.";
+  add("path-x", "Camera path, across", "px", "Where the camera points, to the right.", 4,
+      &CameraPlace::x);
+  add("path-y", "Camera path, down", "px", "Where the camera points, downwards.", 4,
+      &CameraPlace::y);
+  add("path-angle", "Camera path, turn", "degrees", "How the camera is turned, clockwise.", 0.4,
+      &CameraPlace::angle);
+  add("path-zoom", "Camera path, closeness", "times",
+      "How close the camera is to what it shows, 1 at first.", 0.02, &CameraPlace::zoom);
+}
+
 void AddSolve(const SolveFigures& figures, const std::vector<double>& scores, Page& page) {
   if (figures.track_life > 0) {
-    AddPath(figures, page);
     AddTracks(figures, page);
   } else {
     page.notes.push_back("Nothing to track was found: the frames stay as they are.");
   }
   AddModels(scores, page);
   AddCrop(figures, page);
+}
+
+void AddShake(const SolveFigures& figures, Page& page) {
+  if (figures.track_life == 0) return;
+  const double shake = ShakeOf(PathOf(figures.before)), left = ShakeOf(PathOf(figures.after));
+  page.facts.push_back({"Shake", Short(shake, 2) + " px/" + figures.row + "² as shot, " +
+                                     Short(left, 2) + " steadied"});
+  constexpr double kSeen = 0.3;  // px/frame²
+  NoteWhatIsLeft(shake, left, kSeen, figures, page);
+}
+
+void NoteWhatIsLeft(double shake, double left, double seen, const SolveFigures& figures,
+                    Page& page) {
+  constexpr double kHardly = 0.75;  // of the shake
+  if (figures.track_life > 0 && shake > seen && left > kHardly * shake) {
+    page.notes.push_back(
+        "Hardly steadier than it was shot. Half of its tracks last " +
+        std::to_string(figures.track_life) + " " + figures.row +
+        "s or fewer: where they are short, as in quick pans and blur, or where someone near "
+        "moves against the scene, little can be smoothed.");
+  }
 }
 
 void AddEmptyShares(const std::vector<double>& empty, std::size_t rows, Page& page) {

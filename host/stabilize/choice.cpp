@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdio>
 #include <iterator>
 #include <nlohmann/json.hpp>
 #include <utility>
@@ -21,6 +22,18 @@ constexpr const char* kStills[] = {"auto", "all", "background", "subject"};  // 
 
 double Decibels(double value) {
   return 20 * std::log10(value);
+}
+
+// Less is better: first whether black is left, then the cost.
+std::pair<bool, double> RankOf(const Candidate& candidate, const ChoiceWeights& weights) {
+  return {candidate.outcome.most_black > weights.black, candidate.cost};
+}
+
+template <class... Values>
+std::string Printed(const char* format, Values... values) {
+  char text[128];
+  std::snprintf(text, sizeof text, format, values...);
+  return text;
 }
 
 nlohmann::ordered_json ToJson(const ParamValues& values) {
@@ -44,6 +57,50 @@ std::string Choice::Text() const {
   std::string text = best().name;
   if (still != Still::all) text += ", "s + kStills[static_cast<std::size_t>(still)] + " held still";
   if (candidates.size() > 1) text += ", best of " + std::to_string(candidates.size());
+  return text;
+}
+
+std::string Choice::Why() const {
+  const ChoiceWeights weights;
+  const Candidate* next = nullptr;
+  for (const Candidate& candidate : candidates) {
+    if (&candidate == &best() || !candidate.follows) continue;
+    if (!next || RankOf(candidate, weights) < RankOf(*next, weights)) next = &candidate;
+  }
+  if (!next || !best().follows) return "";
+  const Outcome &a = next->outcome, &b = best().outcome;
+  std::string text = "next comes " + next->name;
+  if (RankOf(*next, weights).first && !RankOf(best(), weights).first) {
+    return text + Printed(", which leaves %.1f %% of a frame black", 100 * a.most_black);
+  }
+  text += Printed(", %.1f decibels behind", next->cost - best().cost);
+  struct Figure {
+    double next, best;  // less is better
+    const char *worse, *better, *format;
+  };
+  const Figure figures[] = {
+      {-100 * a.width_kept, -100 * b.width_kept, "it keeps less of the width",
+       "it keeps more of the width", " (%.0f %% against %.0f %%)"},
+      {a.after.mean, b.after.mean, "its background shakes more", "its background shakes less",
+       " (%.2f against %.2f)"},
+      {a.tracks_after, b.tracks_after, "its tracks shake more", "its tracks shake less",
+       " (%.2f against %.2f)"},
+      {std::max(a.wobble_after, a.wobble_before), std::max(b.wobble_after, b.wobble_before),
+       "it wobbles more", "it wobbles less", " (%.2f against %.2f)"}};
+  for (const bool worse : {true, false}) {
+    const char* begin = worse ? ": " : "; but ";
+    for (const Figure& figure : figures) {
+      const std::string of_both =
+          Printed(figure.format, std::abs(figure.next), std::abs(figure.best));
+      // What the digits don't show is no difference.
+      if (of_both == Printed(figure.format, std::abs(figure.best), std::abs(figure.next)) ||
+          (figure.next > figure.best) != worse) {
+        continue;
+      }
+      text += begin + std::string(worse ? figure.worse : figure.better) + of_both;
+      begin = ", ";
+    }
+  }
   return text;
 }
 
@@ -142,11 +199,11 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
       tries.size());
   std::size_t best = 0;
   for (std::size_t i = 1; i < tries.size(); ++i) {
-    if (RankOf(tries[i]) < RankOf(tries[best])) best = i;
+    if (RankOf(tries[i], weights_) < RankOf(tries[best], weights_)) best = i;
   }
   choice_.candidates.push_back(std::move(tries[best]));
   if (choice_.candidates.size() > 1 &&
-      RankOf(choice_.candidates.back()) >= RankOf(choice_.best())) {
+      RankOf(choice_.candidates.back(), weights_) >= RankOf(choice_.best(), weights_)) {
     return false;
   }
   choice_.taken = choice_.candidates.size() - 1;
@@ -197,10 +254,6 @@ double Chooser::CostOf(const Candidate& candidate) const {
   if (candidate.follows && candidate.warps == Warps::none) cost += weights_.bends;
   if (!candidate.changes.empty()) cost += weights_.change;
   return cost;
-}
-
-std::pair<bool, double> Chooser::RankOf(const Candidate& candidate) const {
-  return {candidate.outcome.most_black > weights_.black, candidate.cost};
 }
 
 }  // namespace calmframe::host

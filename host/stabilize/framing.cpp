@@ -48,7 +48,7 @@ CropTrouble CropTroubleOf(SteadyClip& clip) {
   return {.kind = Kind::small, .window = *crop};
 }
 
-CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watcher& watcher) {
+bool Follows(SteadyClip& clip, const WindowSettings& settings) {
   using Kind = WindowSettings::Kind;
   const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };
   const bool may_follow = value(HX_FRAMING) == kCropAutoScale &&
@@ -70,10 +70,13 @@ CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watc
   const auto leaves_black = [&] {
     return value(HX_RESULT) == kSmoothMotion && clip.Measure().most_black > kMostBlack;
   };
-  const bool follows = may_follow && settings.kind != Kind::steady &&
-                       (asked || (!settings.as_set && (chosen || as_it_comes || leaves_black())));
-  if (!follows) {
-    if (chosen) {
+  return may_follow && settings.kind != Kind::steady &&
+         (asked || (!settings.as_set && (chosen || as_it_comes || leaves_black())));
+}
+
+CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watcher& watcher) {
+  if (!Follows(clip, settings)) {
+    if (clip.choice()) {
       clip.ForgetChoice();
       clip.Work(watcher);
     }
@@ -81,7 +84,8 @@ CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watc
     return CropTroubleOf(clip);
   }
   clip.FollowPicture(
-      {.most_zoom = settings.most_zoom > 0 ? settings.most_zoom : value(HX_MAXIMUM_SCALE) / 100,
+      {.most_zoom = settings.most_zoom > 0 ? settings.most_zoom
+                                           : clip.ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100,
        .zoom_speed = settings.zoom_speed.value_or(FollowRequest().zoom_speed),
        .may_choose = !settings.as_set,
        .still = settings.still},

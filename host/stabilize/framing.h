@@ -41,6 +41,10 @@ struct CropTrouble {
 };
 CropTrouble CropTroubleOf(SteadyClip& clip);
 
+// After the clip's work: whether windows that follow the picture are what is shown by these
+// settings. Throws WindowRefused, SolveFailure.
+bool Follows(SteadyClip& clip, const WindowSettings& settings);
+
 // After the clip's work: chooses what is shown of it, and has that drawn from then on; for every
 // front end alike. What comes back is the trouble with the effect's own crop window, where that is
 // what is shown. Throws WindowRefused, SolveFailure, Interrupted.

@@ -552,6 +552,7 @@ void SteadyClip::Draw(const Choice& choice, const std::vector<Similarity>& windo
   saved.instance = WithWindows(saved.instance, windows, choice.best().warps);
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
   drawn_ = &session_.Load(LayerOfItsOwn(), saved);
+  windows_ = windows;
   session_.TickUntilSettled(std::chrono::hours(24), [&] { return watcher.Stops(); });
   if (watcher.Stops()) throw Interrupted();
   const int status = Session::StatusOf(*drawn_);
@@ -561,6 +562,7 @@ void SteadyClip::Draw(const Choice& choice, const std::vector<Similarity>& windo
 void SteadyClip::DrawByItself() {
   if (drawn_) session_.Remove(*drawn_);
   drawn_ = nullptr;
+  windows_.clear();
 }
 
 Outcome SteadyClip::Measure() {
@@ -577,6 +579,15 @@ Outcome SteadyClip::Measure() {
     outcome.most_black = std::max(outcome.most_black, 1 - across * down);
   }
   return outcome;
+}
+
+ShownPath SteadyClip::Path() {
+  const SolvedClip solved = Solved();
+  ShownPath path = drawn_ ? PathShown(solved, choice_->best().warps, windows_)
+                          : PathShown(solved, Warps::solved, OwnWindows(solved, Zoom(solved)));
+  path.most_zoom = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100 *
+                   (drawn_ ? choice_->most_zoom : ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100);
+  return path;
 }
 
 double SteadyClip::FramesPerSecond() const {

@@ -14,6 +14,7 @@
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
 #include "host/stabilize/choice.h"
+#include "host/stabilize/shown_path.h"
 #include "host/stabilize/watcher.h"
 #include "host/timeline/source.h"
 
@@ -104,6 +105,8 @@ class SteadyClip {
   bool has_new_choice() const { return has_new_choice_; }
   // After Work, with a framing that crops: what the output shows.
   Outcome Measure();
+  // The same frame by frame. Throws SolveFailure.
+  ShownPath Path();
 
   // Throws SolveFailure where the effect can't be saved.
   Project Saved();
@@ -175,8 +178,9 @@ class SteadyClip {
   const std::shared_ptr<const media::FoundFrames> found_;  // null of a stand-in
   Host host_;
   Session session_;
-  Effect* effect_ = nullptr;  // the session's
-  Effect* drawn_ = nullptr;   // the session's; null: the effect itself
+  Effect* effect_ = nullptr;         // the session's
+  Effect* drawn_ = nullptr;          // the session's; null: the effect itself
+  std::vector<Similarity> windows_;  // that it shows; none of the effect itself
   std::optional<Choice> choice_;
   bool has_new_choice_ = false;
   std::set<std::int32_t> set_;  // disk ids of the parameters that somebody set

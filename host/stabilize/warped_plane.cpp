@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <limits>
 
 namespace calmframe::host {
 
@@ -34,6 +35,28 @@ Point WarpedPlane::At(std::size_t frame, Point source) const {
            (warp.at(c, r + 1).*axis * (1 - fx) + warp.at(c + 1, r + 1).*axis * fx) * fy;
   };
   return {mix(&Point::x), mix(&Point::y)};
+}
+
+// Newton's method; from cell to cell the slope hardly changes.
+Point WarpedPlane::SourceAt(std::size_t frame, Point plane) const {
+  constexpr int kMostSteps = 30;
+  constexpr double kNear = 1e-3;  // pixels
+  Point source{(clip_.source_width - 1) / 2.0, (clip_.source_height - 1) / 2.0};
+  for (int step = 0; step < kMostSteps; ++step) {
+    const Point at = At(frame, source), right = At(frame, {source.x + 1, source.y}),
+                down = At(frame, {source.x, source.y + 1});
+    const double xx = right.x - at.x, yx = right.y - at.y;
+    const double xy = down.x - at.x, yy = down.y - at.y;
+    const double determinant = xx * yy - xy * yx;
+    if (!(determinant > 0)) break;
+    const Point off{plane.x - at.x, plane.y - at.y};
+    const Point by{(off.x * yy - off.y * xy) / determinant,
+                   (off.y * xx - off.x * yx) / determinant};
+    source = {source.x + by.x, source.y + by.y};
+    if (std::hypot(by.x, by.y) < kNear) return source;
+  }
+  constexpr double kNone = std::numeric_limits<double>::quiet_NaN();
+  return {kNone, kNone};
 }
 
 double WarpedPlane::Scale(std::size_t frame) const {

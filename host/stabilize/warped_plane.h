@@ -24,6 +24,9 @@ class WarpedPlane {
   }
   // Of a place in the source, in its own pixels; inside of a cell the vertices' bilinear mean.
   Point At(std::size_t frame, Point source) const;
+  // The place in the source that lies there in the plane, also beyond the frame's edges, to a
+  // thousandth of a pixel. No numbers where the warp is folded.
+  Point SourceAt(std::size_t frame, Point plane) const;
   // How many times the warp enlarges the frame: the root of its outline's area (the shoelace
   // formula) over the frame's. 0 of a folded one.
   double Scale(std::size_t frame) const;

@@ -422,10 +422,13 @@ TEST_F(ProgramTest, AnalyzeTellsWithoutRendering) {
   EXPECT_THAT(RunWell("analyze in.mp4 --quiet"),
               ::testing::AllOf(HasSubstr("in.mp4: 30 frames of 160x120\ncrop window "),
                                HasSubstr("Auto-scale (1")));
+  // What isn't shown is no trouble.
+  EXPECT_THAT(RunWell("analyze in.mp4 --quiet --maximum-scale 101"), Not(HasSubstr("black")));
   // Too little is told, and what is told is enough.
   for (const std::string additional : {"100", "102"}) {
-    const std::string analyze = "analyze in.mp4 --project p.calm --quiet --additional-scale " +
-                                additional + " --maximum-scale ";
+    const std::string analyze =
+        "analyze in.mp4 --project p.calm --quiet --result no-motion --additional-scale " +
+        additional + " --maximum-scale ";
     const std::string black = Run(analyze + "101").text;
     ASSERT_THAT(black, HasSubstr("% of the picture stays black"));
     const std::size_t scale = black.find("--maximum-scale ");

@@ -1,5 +1,6 @@
 #include <nlohmann/json.hpp>
 #include <numbers>
+#include <regex>
 
 #include "tests/apps/calmframe/program_fixture.h"
 
@@ -27,6 +28,27 @@ std::vector<double> Values(const nlohmann::json& data, const char* plot, const c
   return data.at("plots").at(plot).at("curves").at(curve).get<std::vector<double>>();
 }
 
+// What the page's table of candidates has of one, by column; its name of the one chosen.
+std::map<std::string, std::string> RowOf(const std::string& page, const std::string& name) {
+  const auto cells = [](const std::string& text, const char* tag) {
+    const std::regex cell("<" + std::string(tag) + "[^>]*>([^<]*)");
+    std::vector<std::string> found;
+    for (std::sregex_iterator at(text.begin(), text.end(), cell), end; at != end; ++at) {
+      found.push_back((*at)[1]);
+    }
+    return found;
+  };
+  const std::string table = page.substr(page.find("<table class=\"ways\">"));
+  const std::vector<std::string> columns = cells(table.substr(0, table.find("</thead>")), "th ");
+  const std::size_t begin = table.find("<th scope=\"row\">" + name + "<");
+  if (begin == std::string::npos) return {};
+  const std::vector<std::string> values =
+      cells(table.substr(begin, table.find("</tr>", begin) - begin), "td");
+  std::map<std::string, std::string> row;
+  for (std::size_t i = 0; i < values.size(); ++i) row[columns.at(i + 1)] = values[i];
+  return row;
+}
+
 double Roughness(const std::vector<double>& values) {
   double sum = 0;
   for (std::size_t i = 2; i < values.size(); ++i) {
@@ -41,7 +63,7 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
   const std::string quoted = "\"" + clip + "\"";
   RunWell("analyze " + quoted + " --project w.calm --quiet");
   const std::string saved = Content("w.calm");
-  EXPECT_EQ(RunWell("report w.calm w.html --quiet"), "");
+  EXPECT_EQ(RunWell("report w.calm w.html --quiet --window steady"), "");
   EXPECT_EQ(Content("w.calm"), saved);
   const std::string page = Content("w.html");
   EXPECT_THAT(page, HasSubstr("<h1>a &lt;wall&gt; &amp; &#39;more&#39;.mp4</h1>"));
@@ -95,6 +117,76 @@ TEST_F(ReportTest, TellsTheCameraThatMadeTheClip) {
   }
 }
 
+// The hand shakes, and more than the solve smooths away stays in view.
+TEST_F(ReportTest, ShowsWhatStabilizeShowsAndWhy) {
+  MakeWall("in.mkv", Made(kWidth, kHeight, kFrames, 25), [](double t) {
+    return Camera{4 * t + 3 * std::sin(1.9 * t), 3 * std::cos(2.3 * t), 0.004 * std::sin(1.7 * t)};
+  });
+  const auto end = nlohmann::json::parse(
+      RunWell("stabilize in.mkv out.mkv --project p.calm --json --quiet --zoom-at-most 1.3"));
+  const nlohmann::json& choice = end.at("choice");
+  const std::string saved = Content("p.calm");
+  RunWell("report p.calm p.html --quiet --zoom-at-most 1.3");
+  EXPECT_EQ(Content("p.calm"), saved);
+  const std::string page = Content("p.html");
+  int taken = 0;
+  for (const auto& candidate : choice.at("candidates")) {
+    const auto name = candidate.at("name").get<std::string>();
+    auto row = RowOf(page, name);
+    ASSERT_EQ(row.size(), 7u) << name;
+    const auto told = [&](const char* column) { return std::stod(row[column]); };
+    EXPECT_NEAR(told("Width kept"), 100 * candidate.at("width_kept").get<double>(), 0.06) << name;
+    EXPECT_NEAR(told("Greatest zoom"), candidate.at("most_zoom"), 0.006) << name;
+    EXPECT_NEAR(told("Black at most"), 100 * candidate.at("most_black").get<double>(), 0.06);
+    EXPECT_NEAR(told("Shake"), candidate.at("shake_after"), 0.006) << name;
+    EXPECT_NEAR(told("Shake of tracks"), candidate.at("tracks_after"), 0.006) << name;
+    EXPECT_NEAR(told("Wobble"), candidate.at("wobble_after"), 0.006) << name;
+    if (name == "as filmed") {
+      EXPECT_EQ(row["Cost, dB"], "–") << "it is not weighed by it";
+    } else {
+      EXPECT_NEAR(told("Cost, dB"), candidate.at("cost"), 0.006) << name;
+    }
+    const bool is_taken = candidate.at("taken");
+    taken += is_taken;
+    EXPECT_EQ(page.find(name + "<mark>chosen</mark>") != std::string::npos, is_taken) << name;
+  }
+  EXPECT_EQ(taken, 1);
+
+  // The frames' own figures are those of the whole, and the windows stay in the picture.
+  const nlohmann::json data = DataOf(page);
+  const auto zoom = Values(data, "window-zoom", "zoom");
+  ASSERT_EQ(zoom.size(), std::size_t{kFrames});
+  EXPECT_NEAR(*std::max_element(zoom.begin(), zoom.end()), end.at("most_zoom"), 1e-3);
+  double kept = 0;
+  for (const double value : zoom) kept += 1 / value / kFrames;
+  EXPECT_NEAR(kept, end.at("width_kept"), 1e-3);
+  for (const double most : data.at("plots").at("window-zoom").at("band").at("most")) {
+    EXPECT_EQ(most, 1.3);
+  }
+  for (const char* plot : {"window-x", "window-y"}) {
+    const auto centre = Values(data, plot, "centre");
+    const nlohmann::json& band = data.at("plots").at(plot).at("band");
+    for (int f = 0; f < kFrames; ++f) {
+      EXPECT_GT(centre.at(f), band.at("least").at(f)) << plot << f;
+      EXPECT_LT(centre.at(f), band.at("most").at(f)) << plot << f;
+    }
+  }
+  // What the window adds to the camera's path is what makes it calm.
+  const auto shot = Values(data, "path-x", "as shot"), steady = Values(data, "path-x", "steadied");
+  const auto across = Values(data, "window-x", "centre");
+  for (int f = 0; f < kFrames; ++f) {
+    EXPECT_NEAR(steady[f] - shot[f], across[f] - across[0], 1.5) << f;
+  }
+  EXPECT_LT(Roughness(steady), 0.2 * Roughness(shot));
+  EXPECT_EQ(data.at("plots").count("crop"), 0u) << "the effect's own";
+
+  // The project tells the same.
+  EXPECT_EQ(nlohmann::json::parse(Run("info p.calm --json").text).at("choice"), choice);
+  EXPECT_THAT(RunWell("info p.calm"), HasSubstr("of the width kept, zoom "));
+  RunWell("report p.calm steady.html --quiet --window steady");
+  EXPECT_THAT(Content("steady.html"), HasSubstr("<p class=\"lead\">Steadied: crop window "));
+}
+
 TEST_F(ReportTest, WithoutItsClipThePageHasAllButThePictures) {
   MakeClip("wide.mkv", 160, 120, 20, {64, 45});
   const std::string told = RunWell("analyze wide.mkv --project w.calm --quiet");
@@ -105,9 +197,11 @@ TEST_F(ReportTest, WithoutItsClipThePageHasAllButThePictures) {
   EXPECT_THAT(page, HasSubstr("wide.mkv is gone; the page has no pictures</li>"));
   EXPECT_EQ(page.find("<img"), std::string::npos);
   EXPECT_EQ(DataOf(page), DataOf(Content("with.html")));
-  // The result is told as analyze tells it.
+  // The effect's own result is told as analyze tells it.
+  RunWell("report w.calm own.html --quiet --window steady");
   const std::string crop = told.substr(told.find("crop window"));
-  EXPECT_THAT(page, HasSubstr(crop.substr(0, crop.find('\n'))));
+  EXPECT_THAT(crop, HasSubstr("%), with --window steady\n"));
+  EXPECT_THAT(Content("own.html"), HasSubstr(crop.substr(0, crop.find(", with"))));
   // Another clip in its place is none of its pictures.
   MakeClip("wide.mkv", 160, 120, 6);
   ExpectLine("report w.calm other.html --quiet", 0, "is not the clip");
@@ -144,37 +238,49 @@ TEST_F(ReportTest, ABrowserShowsEveryPlotWithoutAWordOfComplaint) {
   }
   EXPECT_EQ(Content("in.mp4"), clip);
   EXPECT_EQ(Content("p.calm"), saved);
-  const std::string page = Content("p.html");
-  EXPECT_EQ(page.find("http:"), std::string::npos) << "nothing comes from elsewhere";
-  EXPECT_EQ(page.find("https:"), std::string::npos);
-  if (Shell("command -v chromium").code != 0) GTEST_SKIP() << "no chromium";
-  const Outcome browser = Shell(
-      "cd '" + path().string() +
-      "' && HOME=$PWD timeout 120 chromium --headless --no-sandbox "
-      "--disable-gpu --disable-dev-shm-usage --user-data-dir=$PWD/profile --enable-logging=stderr "
-      "--virtual-time-budget=5000 --dump-dom \"file://$PWD/p.html\" 2>log.txt");
-  ASSERT_EQ(browser.code, 0) << Content("log.txt");
-  EXPECT_EQ(Content("log.txt").find("CONSOLE"), std::string::npos) << Content("log.txt");
-  const std::string& dom = browser.text;
-  // The script makes each plot it has found the data of answer to the keyboard.
-  for (const char* plot :
-       {"path-x", "path-y", "path-angle", "path-zoom", "tracks", "models", "crop", "empty"}) {
-    const std::size_t begin = dom.find("id=\"" + std::string(plot) + "\"");
-    ASSERT_NE(begin, std::string::npos) << plot;
-    const std::string svg = dom.substr(begin, dom.find("</svg>", begin) - begin);
-    EXPECT_THAT(svg.substr(0, svg.find('>')), HasSubstr("tabindex=\"0\"")) << plot;
-    const std::size_t curve = svg.find(" d=\"M");
-    ASSERT_NE(curve, std::string::npos) << plot;
-    const std::string path = svg.substr(curve, svg.find('"', curve + 4) - curve);
-    EXPECT_GE(std::count(path.begin(), path.end(), 'L'), 19) << plot;
-    EXPECT_EQ(path.find("nan"), std::string::npos) << plot;
+  RunWell("report p.calm own.html --quiet --window steady");
+  struct Page {
+    const char* name;
+    std::vector<std::string> plots;
+  };
+  for (const Page& shown :
+       {Page{"p", {"window-x", "window-y", "window-zoom"}}, Page{"own", {"models", "crop"}}}) {
+    const std::string page = Content(std::string(shown.name) + ".html");
+    EXPECT_EQ(page.find("http:"), std::string::npos) << "nothing comes from elsewhere";
+    EXPECT_EQ(page.find("https:"), std::string::npos);
+    if (Shell("command -v chromium").code != 0) GTEST_SKIP() << "no chromium";
+    const Outcome browser =
+        Shell("cd '" + path().string() +
+              "' && HOME=$PWD timeout 120 chromium --headless --no-sandbox --disable-gpu "
+              "--disable-dev-shm-usage --user-data-dir=$PWD/profile --enable-logging=stderr "
+              "--virtual-time-budget=5000 --dump-dom \"file://$PWD/" +
+              shown.name + ".html\" 2>log.txt");
+    ASSERT_EQ(browser.code, 0) << Content("log.txt");
+    EXPECT_EQ(Content("log.txt").find("CONSOLE"), std::string::npos) << Content("log.txt");
+    const std::string& dom = browser.text;
+    // The script makes each plot it has found the data of answer to the keyboard.
+    std::vector<std::string> plots = shown.plots;
+    for (const char* plot : {"path-x", "path-y", "path-angle", "path-zoom", "tracks", "empty"}) {
+      plots.push_back(plot);
+    }
+    for (const std::string& plot : plots) {
+      const std::size_t begin = dom.find("id=\"" + plot + "\"");
+      ASSERT_NE(begin, std::string::npos) << plot;
+      const std::string svg = dom.substr(begin, dom.find("</svg>", begin) - begin);
+      EXPECT_THAT(svg.substr(0, svg.find('>')), HasSubstr("tabindex=\"0\"")) << plot;
+      const std::size_t curve = svg.find(" d=\"M", svg.find("class=\"curve"));
+      ASSERT_NE(curve, std::string::npos) << plot;
+      const std::string line = svg.substr(curve, svg.find('"', curve + 4) - curve);
+      EXPECT_GE(std::count(line.begin(), line.end(), 'L'), 19) << plot;
+      EXPECT_EQ(svg.find("nan"), std::string::npos) << plot;
+    }
+    int pictures = 0;
+    for (std::size_t at = 0;
+         (at = dom.find("src=\"data:image/jpeg;base64,", at)) != std::string::npos; ++at) {
+      ++pictures;
+    }
+    EXPECT_EQ(pictures, 12);
   }
-  int pictures = 0;
-  for (std::size_t at = 0;
-       (at = dom.find("src=\"data:image/jpeg;base64,", at)) != std::string::npos; ++at) {
-    ++pictures;
-  }
-  EXPECT_EQ(pictures, 12);
 }
 
 }  // namespace

@@ -123,6 +123,52 @@ TEST(FollowWindowsTest, WhatTheCameraZoomsIsNoChangeOfZoom) {
   }
 }
 
+TEST(ChoiceTest, TellsWhatTheNextBestIsWorseAt) {
+  const auto way = [](const char* name, double cost, double width, double shake, double tracks,
+                      double wobble, double black = 0) {
+    Candidate candidate{.name = name};
+    candidate.cost = cost;
+    candidate.outcome.width_kept = width;
+    candidate.outcome.after.mean = shake;
+    candidate.outcome.tracks_after = tracks;
+    candidate.outcome.wobble_before = 0.3;
+    candidate.outcome.wobble_after = wobble;
+    candidate.outcome.most_black = black;
+    return candidate;
+  };
+  const Candidate good = way("good", 2, 0.85, 1.2, 1, 0.2), far = way("far", 9, 0.5, 4, 4, 0.3),
+                  mixed = way("mixed", 3.2, 0.79, 1.5, 0.7, 0.6),
+                  same = way("same", 2.5, 0.8501, 1.201, 1, 0.25),
+                  black = way("black", 1, 0.9, 1, 1, 0.2, 0.02);
+  Candidate filmed = way("as filmed", 1, 1, 9, 9, 0.3);
+  filmed.follows = false;  // it is not weighed by its cost
+  struct Case {
+    std::vector<Candidate> candidates;
+    std::size_t taken;
+    std::string why;
+  };
+  for (const Case& c :
+       {Case{{good}, 0, ""},
+        Case{{far, good, mixed},
+             1,
+             "next comes mixed, 1.2 decibels behind: it keeps less of the width (79 % against "
+             "85 %), its background shakes more (1.50 against 1.20), it wobbles more (0.60 against "
+             "0.30); but its tracks shake less (0.70 against 1.00)"},
+        Case{{good, same, mixed}, 0, "next comes same, 0.5 decibels behind"},
+        Case{{good, filmed}, 0, ""}, Case{{good, filmed, mixed}, 1, ""},
+        Case{{black, good}, 1, "next comes black, which leaves 2.0 % of a frame black"},
+        Case{{good, far, black},
+             0,
+             "next comes far, 7.0 decibels behind: it keeps less of the width (50 % against 85 %), "
+             "its background shakes more (4.00 against 1.20), its tracks shake more (4.00 against "
+             "1.00)"}}) {
+    Choice choice;
+    choice.candidates = c.candidates;
+    choice.taken = c.taken;
+    EXPECT_EQ(choice.Why(), c.why);
+  }
+}
+
 TEST(ChooserTest, ATextBringsTheChoiceBack) {
   const SolvedClip clip = Filmed(15);
   Chooser first(clip, {.zoom_speed = 2.5});

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <nlohmann/json.hpp>
 #include <string>
 #include <vector>
@@ -32,6 +33,10 @@ class Onlooker final : public Watcher {
   const std::string last_stage_;
 };
 
+double MostZoom(const ShownPath& path) {
+  return *std::max_element(path.output.zooms.begin(), path.output.zooms.end());
+}
+
 class SteadyClipTest : public testing::Test {
  protected:
   SteadyClipTest() { WriteStreet(path_, Made(160, 120, 24, 25), 7); }
@@ -52,11 +57,14 @@ TEST_F(SteadyClipTest, FromAClipToWhatItShowsAndBack) {
     const Outcome own = clip.Measure();
     EXPECT_EQ(own.window, Outcome::Window::steady);
     EXPECT_LT(own.after.mean, own.before.mean / 2);
+    EXPECT_NEAR(MostZoom(clip.Path()), own.most_zoom, 1e-9);
     clip.FollowPicture({.most_zoom = 1.2}, onlooker);
     const Outcome following = clip.Measure();
     EXPECT_EQ(following.window, Outcome::Window::follow);
     EXPECT_LT(following.after.mean, following.before.mean / 2);
     EXPECT_LE(following.most_zoom, 1.2 + 1e-3);
+    EXPECT_NEAR(MostZoom(clip.Path()), following.most_zoom, 1e-9);
+    EXPECT_EQ(clip.Path().most_zoom, 1.2);
     // The picture again without its windows, and by other controls.
     clip.SetControls({{HX_SMOOTHNESS.disk_id, 10}});
     EXPECT_EQ(clip.Work(onlooker).Text(), "reused the analysis");

@@ -1,0 +1,52 @@
+#include "host/stabilize/shown_path.h"
+
+#include <algorithm>
+#include <cstddef>
+
+#include "host/stabilize/warped_plane.h"
+
+namespace calmframe::host {
+namespace {
+
+std::vector<WindowPlace> PlacesOf(const WarpedPlane& plane,
+                                  const std::vector<Similarity>& windows) {
+  const SolvedClip& clip = plane.clip();
+  const Point middle = Middle(clip);
+  const double width = clip.width - 1.0, height = clip.height - 1.0;
+  const double square = width / (clip.source_width - 1.0);
+  std::vector<WindowPlace> places;
+  places.reserve(windows.size());
+  for (std::size_t f = 0; f < windows.size(); ++f) {
+    const auto in_source = [&](Point output) {
+      const Point at = windows[f](output);
+      const Point source = plane.SourceAt(f, {at.x - middle.x, at.y - middle.y});
+      return Point{source.x * square - middle.x, source.y - middle.y};
+    };
+    WindowPlace place;
+    place.centre = in_source(middle);
+    Point first = place.centre, last = place.centre;
+    for (const Point& corner : {Point{}, Point{width, 0}, Point{0, height}, Point{width, height}}) {
+      const Point at = in_source(corner);
+      first = {std::min(first.x, at.x), std::min(first.y, at.y)};
+      last = {std::max(last.x, at.x), std::max(last.y, at.y)};
+    }
+    place.least = {place.centre.x - first.x - middle.x, place.centre.y - first.y - middle.y};
+    place.most = {place.centre.x - last.x + middle.x, place.centre.y - last.y + middle.y};
+    places.push_back(place);
+  }
+  return places;
+}
+
+}  // namespace
+
+ShownPath PathShown(const SolvedClip& clip, Warps warps, const std::vector<Similarity>& windows) {
+  const WarpedPlane rest(clip, Warps::none), plane(clip, warps);
+  const PictureMotion source = FindMotion(rest);
+  ShownPath path;
+  path.source = MotionOfSource(clip, source);
+  path.output = MotionShown(plane, warps == Warps::none ? source : FindMotion(plane), windows);
+  path.windows = PlacesOf(plane, windows);
+  return path;
+}
+
+}  // namespace calmframe::host
