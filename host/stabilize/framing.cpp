@@ -76,10 +76,7 @@ bool Follows(SteadyClip& clip, const WindowSettings& settings) {
 
 CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watcher& watcher) {
   if (!Follows(clip, settings)) {
-    if (clip.choice()) {
-      clip.ForgetChoice();
-      clip.Work(watcher);
-    }
+    if (clip.ForgetChoice()) clip.Work(watcher);
     clip.HoldStill(settings.still, watcher);
     return CropTroubleOf(clip);
   }

@@ -204,12 +204,13 @@ SteadyClip::SteadyClip(const std::string& plugin, const Project* project, const 
   // Saved work keeps what it was made with.
   if (!project) Set(HX_TRANSITION_BISQUARE_SIGMA.disk_id, kTransitionBisquareSigma);
   if (project) choice_ = Choice::Parse(project->choice);
+  if (choice_) held_ = choice_->still;
 } catch (const PluginError& error) {
   throw SolveFailure(error.what());
 }
 
 void SteadyClip::SetControls(const ParamValues& values) {
-  if (!values.empty()) ForgetChoice();
+  if (!values.empty()) UndoChoice();
   for (const auto& [disk_id, value] : values) {
     Set(disk_id, value);
     set_.insert(disk_id);
@@ -217,14 +218,21 @@ void SteadyClip::SetControls(const ParamValues& values) {
   has_new_controls_ = has_new_controls_ || !values.empty();
 }
 
-void SteadyClip::ForgetChoice() {
+void SteadyClip::UndoChoice() {
   if (!choice_) return;
   for (const auto& [disk_id, value] : choice_->best().changes) {
     if (ValueOf(disk_id) == value) Set(disk_id, choice_->given[disk_id]);
   }
-  if (choice_->still != Still::all) effect_->DeleteTracks({});
   choice_.reset();
   has_new_controls_ = true;
+}
+
+bool SteadyClip::ForgetChoice() {
+  const bool had_one = choice_ || held_ != Still::all;
+  UndoChoice();
+  if (held_ != Still::all) effect_->DeleteTracks({});
+  held_ = Still::all;
+  return had_one;
 }
 
 void SteadyClip::TakeAsSaved() {
@@ -417,12 +425,18 @@ void SteadyClip::HoldStill(Still still, Watcher& watcher) {
   std::vector<TrackPoint> left_out;
   if (still != Still::all) {
     const SolvedClip solved = Solved();
-    left_out =
-        TracksOf(solved, FindMotionGroups(solved),
-                 still == Still::background ? MotionGroup::subject : MotionGroup::background);
+    const MotionGroups groups = FindMotionGroups(solved);
+    if (groups.has_subject) {
+      left_out =
+          TracksOf(solved, groups,
+                   still == Still::background ? MotionGroup::subject : MotionGroup::background);
+    } else if (still == Still::subject) {
+      watcher.Warn(path() + ": nothing near moves against what is behind it; no track is left out");
+    }
   }
   const CommandResult result = effect_->DeleteTracks(left_out);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
+  held_ = still;
   Work(watcher);
 }
 
@@ -438,8 +452,10 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   const bool stands = choice_ && request.may_choose && choice_->most_zoom == request.most_zoom &&
                       choice_->zoom_speed == request.zoom_speed &&
                       (request.still == Still::automatic || request.still == choice_->still);
-  if (choice_ && !stands) {
-    ForgetChoice();
+  if (!request.may_choose) {
+    if (ForgetChoice()) Work(watcher);
+  } else if (choice_ && !stands) {
+    UndoChoice();
     Work(watcher);
   }
   SavedEffect saved;
@@ -456,7 +472,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   }
   const bool as_set = !request.may_choose && request.still == Still::automatic;
   const Still still = as_set ? Still::all : HeldOf(request.still, solved);
-  if (still != Still::all || request.still == Still::all) {
+  if (still != Still::all || held_ != Still::all) {
     HoldStill(still, watcher);
     solved = Solved(*effect_, &saved, path());
   }

@@ -63,8 +63,9 @@ class SteadyClip {
   // there after the next Work; what was chosen beside the controls before is undone. Throws
   // SolveFailure.
   void SetControls(const ParamValues& values);
-  // The controls again as they were given, before any choice. Throws SolveFailure.
-  void ForgetChoice();
+  // The controls again as they were given, before any choice, and all tracks; what they ask for is
+  // there after the next Work. False where that is what there is. Throws SolveFailure.
+  bool ForgetChoice();
 
   const std::string& path() const { return info_.path; }
   // As a clip of its own: a part, where only a stretch of it is worked.
@@ -96,8 +97,8 @@ class SteadyClip {
   // the one that serves the clip best, and what was chosen is saved with it. A choice that was made
   // before stands as long as controls and request do. Throws Interrupted, SolveFailure.
   void FollowPicture(const FollowRequest& request, Watcher& watcher);
-  // After Work: solves anew without the tracks of the background or the subject, or with all.
-  // Automatic leaves them as they are. Throws as Work.
+  // After Work: solves anew without the tracks of the background or the subject, or with all, as
+  // where there is no subject. Automatic leaves them as they are. Throws as Work.
   void HoldStill(Still still, Watcher& watcher);
   // Null where nothing was to choose.
   const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }
@@ -157,6 +158,8 @@ class SteadyClip {
   boost::shared_ptr<Layer> LayerOfItsOwn() const;
   // Whether nobody set a parameter, so that it may be chosen.
   bool IsFree(std::int32_t disk_id) const;
+  // The controls as they were given; the tracks that are left out stay so.
+  void UndoChoice();
   Still HeldOf(Still asked, const SolvedClip& solved) const;
   void TryControls(Chooser& chooser, Watcher& watcher);
   // Goes on with a copy that was solved under other controls.
@@ -183,6 +186,7 @@ class SteadyClip {
   std::vector<Similarity> windows_;  // that it shows; none of the effect itself
   std::optional<Choice> choice_;
   bool has_new_choice_ = false;
+  Still held_ = Still::all;     // as a choice or HoldStill has it
   std::set<std::int32_t> set_;  // disk ids of the parameters that somebody set
   bool has_new_controls_ = false;
   bool analysed_ = false;  // anew, and what is solved of it is still to begin

@@ -65,7 +65,8 @@ TEST_F(SteadyClipTest, FromAClipToWhatItShowsAndBack) {
     EXPECT_LE(following.most_zoom, 1.2 + 1e-3);
     EXPECT_NEAR(MostZoom(clip.Path()), following.most_zoom, 1e-9);
     EXPECT_EQ(clip.Path().most_zoom, 1.2);
-    // The picture again without its windows, and by other controls.
+    // The picture again without its windows, with all tracks, and by other controls.
+    clip.ForgetChoice();
     clip.SetControls({{HX_SMOOTHNESS.disk_id, 10}});
     EXPECT_EQ(clip.Work(onlooker).Text(), "reused the analysis");
     EXPECT_EQ(clip.Measure().window, Outcome::Window::steady);
