@@ -5,6 +5,8 @@
 #include <cmath>
 #include <cstddef>
 
+#include "host/stabilize/median.h"
+
 namespace calmframe::host {
 namespace {
 
@@ -25,12 +27,6 @@ std::vector<double> ParabolaWeights(std::ptrdiff_t reach) {
 std::ptrdiff_t ReachOf(std::ptrdiff_t frames, double frames_per_second) {
   const auto reach = std::max<std::ptrdiff_t>(3, std::lround(kReach * frames_per_second));
   return frames < 2 * reach + 1 ? std::max<std::ptrdiff_t>(2, (frames - 1) / 2) : reach;
-}
-
-double Median(std::vector<double>& values) {
-  const auto middle = values.begin() + static_cast<std::ptrdiff_t>(values.size() / 2);
-  std::nth_element(values.begin(), middle, values.end());
-  return *middle;
 }
 
 }  // namespace

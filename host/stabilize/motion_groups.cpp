@@ -15,9 +15,8 @@ namespace calmframe::host {
 namespace {
 
 // Lengths are in widths of the frame, about its middle; misses are squared, in squares of this.
-constexpr double kTolerance = 0.003;  // how far a track may well be from its motion in a frame
-constexpr double kMostMiss = 4;       // of a track that follows neither
-constexpr std::size_t kFewest = 12;   // tracks from one frame to the next that tell of motions
+constexpr double kMostMiss = 4;      // of a track that follows neither
+constexpr std::size_t kFewest = 12;  // tracks from one frame to the next that tell of motions
 
 // Rounds of the mixture: with two motions that are equals, then with the background known.
 constexpr int kEqualRounds = 3, kUnequalRounds = 5;
@@ -28,7 +27,7 @@ constexpr double kSure = 0.5;
 constexpr std::int32_t kDeletedBegins = -10, kDeletedGoesOn = -11;
 
 double MissOf(const Point& off) {
-  return (off.x * off.x + off.y * off.y) / (kTolerance * kTolerance);
+  return (off.x * off.x + off.y * off.y) / (kTrackTolerance * kTrackTolerance);
 }
 
 // -- Tracks --
@@ -356,7 +355,7 @@ class Mixture {
     std::vector<double> misses(steps.size(), 2 * kMostMiss);
     // By how much less a track misses the new motion.
     const auto fit = [&] {
-      const Similarity motion = FitMotion(from, to, kTolerance);
+      const Similarity motion = FitMotion(from, to, kTrackTolerance);
       for (std::size_t i = 0; i < steps.size(); ++i) {
         const auto& [track, at, move] = steps[i];
         const Point reached = motion(at);
@@ -509,7 +508,7 @@ void Judge(const Tracks& tracks, const Mixture& mixture, MotionGroups& groups) {
   if (steps == 0) return;
   groups.has_subject = steps >= kLeastShare * static_cast<double>(tracks.steps().size()) &&
                        of_background >= kLeastMiss * steps && of_background >= 2 * of_subject;
-  const auto root = [&](double sum) { return std::sqrt(sum / steps) * kTolerance * 1000; };
+  const auto root = [&](double sum) { return std::sqrt(sum / steps) * kTrackTolerance * 1000; };
   groups.miss_of_background = root(of_background);
   groups.miss_of_subject = root(of_subject);
 }

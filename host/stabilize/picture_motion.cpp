@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <optional>
 
+#include "host/stabilize/median.h"
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
 
@@ -34,8 +35,7 @@ TrackPairs PairsOf(const WarpedPlane& plane, std::size_t frame) {
 }
 
 constexpr int kColumns = 12, kRows = 7;
-constexpr double kTolerance = 0.003;  // of the width, as for the background's motion
-constexpr double kLost = 0.006;       // of the width: a track that left its place, not the scene
+constexpr double kLost = 0.006;  // of the width: a track that left its place, not the scene
 
 // (x, y) -> (h0 x + h1 y + h2, h3 x + h4 y + h5) / (h6 x + h7 y + 1)
 using Homography = std::array<double, 8>;
@@ -74,7 +74,7 @@ std::optional<Homography> Solve(std::array<std::array<double, 8>, 8> a, Homograp
 Homography Fit(const TrackPairs& pairs, double unit, const Similarity& start) {
   Homography h{start.a, -start.b, start.dx / unit, start.b, start.a, start.dy / unit, 0, 0};
   constexpr int kRounds = 4;
-  constexpr double kFarthest = 1.5 * kTolerance * 2;
+  constexpr double kFarthest = 1.5 * kTrackTolerance * 2;
   for (int round = 0; round < kRounds; ++round) {
     std::array<std::array<double, 8>, 8> a{};
     Homography b{};
@@ -106,12 +106,6 @@ Homography Fit(const TrackPairs& pairs, double unit, const Similarity& start) {
 }
 
 using Cells = std::array<std::optional<Point>, kColumns * kRows>;
-
-double Median(std::vector<double>& values) {
-  const auto middle = values.begin() + static_cast<std::ptrdiff_t>(values.size() / 2);
-  std::nth_element(values.begin(), middle, values.end());
-  return *middle;
-}
 
 // `start`: from the frame before to this one.
 Cells Residuals(const TrackPairs& pairs, const Similarity& start, double width, double height) {
@@ -192,7 +186,7 @@ PictureMotion FindMotion(const WarpedPlane& plane) {
       [&](std::size_t before) {
         const std::size_t f = before + 1;
         const TrackPairs pairs = PairsOf(plane, f);
-        motion.background[f] = FitMotion(pairs.now, pairs.before, kTolerance * clip.width);
+        motion.background[f] = FitMotion(pairs.now, pairs.before, kTrackTolerance * clip.width);
         cells[f] = Residuals(pairs, Inverse(motion.background[f]), clip.width, clip.height);
       },
       frames - 1);

@@ -29,6 +29,9 @@ std::vector<HalfPlane> CoveredRegion(const WarpView& warp, double margin);
 // Communications of the ACM 17, 1974). 1 of one out of reach.
 double UncoveredShare(const WarpView& warp, double width, double height);
 
+// Of the picture's width: how far a track may well be from where its motion takes it in a frame.
+constexpr double kTrackTolerance = 0.003;
+
 // The similarity that takes most points of `from` to those of `to` (equally many), which is that of
 // the background where it holds the most of them: the best of a fixed series of pairs, refined by
 // Tukey's bisquare (Hampel et al., Robust Statistics, 1986, ch. 2.6). `tolerance`: pixels. The

@@ -1,6 +1,5 @@
 #include <nlohmann/json.hpp>
 #include <numbers>
-#include <regex>
 
 #include "tests/apps/calmframe/program_fixture.h"
 
@@ -31,10 +30,12 @@ std::vector<double> Values(const nlohmann::json& data, const char* plot, const c
 // What the page's table of candidates has of one, by column; its name of the one chosen.
 std::map<std::string, std::string> RowOf(const std::string& page, const std::string& name) {
   const auto cells = [](const std::string& text, const char* tag) {
-    const std::regex cell("<" + std::string(tag) + "[^>]*>([^<]*)");
+    const std::string opening = "<" + std::string(tag);
     std::vector<std::string> found;
-    for (std::sregex_iterator at(text.begin(), text.end(), cell), end; at != end; ++at) {
-      found.push_back((*at)[1]);
+    for (std::size_t at = text.find(opening); at != std::string::npos;
+         at = text.find(opening, at + 1)) {
+      const std::size_t begin = text.find('>', at) + 1;
+      found.push_back(text.substr(begin, text.find('<', begin) - begin));
     }
     return found;
   };
