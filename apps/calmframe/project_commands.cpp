@@ -49,8 +49,9 @@ void RenderCommand::Run() {
   const std::unique_ptr<SideBySide> both =
       MakeSideBySide(flags_, written, output_, {project_, clip->path()});
   TellLosses(*writer, both.get(), progress);
-  const Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
+  Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
   Frame(*clip, flags_.window, progress);
+  if (clip->has_new_choice()) unsaved = Leave(*clip, project_);
   RenderClip(*clip, part, SettingsOf(flags_, run_.threads), *writer, both.get(), progress);
   TellOutcome(*clip, progress);
   unsaved.Throw();

@@ -118,6 +118,11 @@ Unsaved WorkAndLeave(host::SteadyClip& clip, const std::string& project, Progres
   if (project.empty()) return Unsaved();
   if (const std::string text = reuse.Text(); !text.empty()) progress.Note(project + ": " + text);
   if (reuse.framing && !clip.has_new_controls()) return Unsaved();
+  return Leave(clip, project);
+}
+
+Unsaved Leave(host::SteadyClip& clip, const std::string& project) {
+  if (project.empty()) return Unsaved();
   try {
     host::SaveProject(project, clip.Saved());
   } catch (const host::ProjectFailure& failure) {

@@ -64,6 +64,9 @@ class Unsaved {
   std::string line_;
 };
 
+// Saves the clip's work. No project is an empty name.
+[[nodiscard]] Unsaved Leave(host::SteadyClip& clip, const std::string& project);
+
 // Does what is left to do, tells what was reused, and saves what is new. No project is an empty
 // name.
 [[nodiscard]] Unsaved WorkAndLeave(host::SteadyClip& clip, const std::string& project,

@@ -67,7 +67,13 @@ void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressL
 void TellOutcome(host::SteadyClip& clip, ProgressLine& progress) {
   if (!host::Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
   const host::Outcome outcome = clip.Measure();
-  progress.End(outcome.Text(), outcome.Json());
+  nlohmann::ordered_json object = outcome.Json();
+  std::string line = outcome.Text();
+  if (const host::Choice* choice = clip.choice()) {
+    object["choice"] = choice->Json();
+    line += "; " + choice->Text();
+  }
+  progress.End(line, object);
 }
 
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
@@ -98,7 +104,21 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
   CLI::Option* const zoom = AddNumber<double>(
       command, "--zoom-at-most", [&flags](double most) { flags.window.most_zoom = most; }, "ZOOM",
       1, 100, "How far a window that follows may enlarge; at first as far as --maximum-scale, 1.5");
-  PutInGroup("Window", {window, zoom});
+  CLI::Option* const steady = AddChoice(
+      command, "--steady",
+      [&flags](const std::string& name) {
+        flags.window.still = name == "background" ? host::Still::background
+                             : name == "subject"  ? host::Still::subject
+                                                  : host::Still::automatic;
+      },
+      {"auto", "background", "subject"},
+      "What is to stand still where somebody near moves against what is behind: the background, or "
+      "that subject. At first the background, where it fills enough of the frame");
+  CLI::Option* const as_set = AddSwitch(
+      command, "--as-set", flags.window.as_set,
+      "Choose nothing for the clip: the controls as they are set, or as they come, and the "
+      "effect's own window");
+  PutInGroup("Window", {window, zoom, steady, as_set});
   CLI::Option* const crf = AddNumber<int>(
       command, "--crf", [&flags](int value) { flags.encode.crf = value; }, "N", 0, 63,
       "How much the encoder may lose: less looks better and makes larger files");
@@ -161,8 +181,9 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
         media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
     const std::unique_ptr<SideBySide> both = MakeSideBySide(flags, info, output, {project});
     TellLosses(*writer, both.get(), progress);
-    const Unsaved unsaved = WorkAndLeave(*clip, project, progress);
+    Unsaved unsaved = WorkAndLeave(*clip, project, progress);
     Frame(*clip, flags.window, progress);
+    if (clip->has_new_choice()) unsaved = Leave(*clip, project);
     RenderClip(*clip, {0, info.frame_count}, SettingsOf(flags, threads), *writer, both.get(),
                progress);
     TellOutcome(*clip, progress);

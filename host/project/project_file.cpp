@@ -27,7 +27,7 @@ using tessel::utility::Guid;
 
 constexpr std::int64_t kApplicationId = 0x43616c6d;  // "Calm", in the database's header
 // 1: the first. 2: the pixels' aspect; it was not told before. 3: the clip's frames.
-constexpr std::int64_t kVersion = 3;
+constexpr std::int64_t kVersion = 4;
 
 constexpr char kChecksum[] = "checksum";
 constexpr char kCreate[] =
@@ -38,8 +38,8 @@ constexpr char kCreate[] =
 constexpr char kCreateFrames[] =
     "CREATE TABLE IF NOT EXISTS frames (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT "
     "NULL)";
-constexpr char kMarkVersion[] = "PRAGMA user_version = 3";
-static_assert(kApplicationId == 1130458221 && kVersion == 3);
+constexpr char kMarkVersion[] = "PRAGMA user_version = 4";
+static_assert(kApplicationId == 1130458221 && kVersion == 4);
 
 [[noreturn]] void Fail(const std::string& path, const std::string& cause) {
   throw ProjectFailure(path + ": " + cause);
@@ -87,6 +87,8 @@ void VisitSettings(Record& project, std::int64_t version, const Visit& visit) {
   if (version < 2) return;
   visit("pixel_aspect_num", project.pixel_aspect.num);
   visit("pixel_aspect_den", project.pixel_aspect.den);
+  if (version < 4) return;
+  visit("choice", project.choice);
 }
 
 // Over all that a project holds. SQLite reads a cut or flipped page as it finds it.

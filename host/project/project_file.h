@@ -27,6 +27,9 @@ struct Project {
   std::int32_t field_type = 0;
 
   SavedEffect effect;
+  // JSON: what was chosen for the clip besides the controls; empty: nothing. See stabilize's
+  // Choice.
+  std::string choice;
 };
 
 // One line that names the file and the cause.

@@ -1,30 +1,103 @@
 #pragma once
 
+#include <cstdint>
+#include <nlohmann/json_fwd.hpp>
+#include <optional>
+#include <string>
+#include <utility>
 #include <vector>
 
+#include "host/effects/param_table.h"
 #include "host/stabilize/outcome.h"
 
 namespace calmframe::host {
 
-// How a clip is shown by windows that follow its picture.
-struct Choice {
+// One way to show a clip by windows that follow its picture.
+struct Candidate {
+  std::string name;          // as users are told of it
+  ParamValues changes = {};  // of the effect's parameters, against the controls as they were given
   Warps warps = Warps::solved;
-  std::vector<Similarity> windows;  // as WithWindows takes them
-  Outcome outcome;
+  bool follows = true;                          // by windows; else the source as it was filmed
+  double width_weight = WindowWeights().width;  // of the windows; set by the chooser
+  Outcome outcome = {};
+  double cost = 0;  // decibels; see ChoiceWeights
 };
 
-// What counts for one candidate against another, in decibels.
+// What counts for one candidate against another, in decibels. Found on nine filmed clips of several
+// kinds; docs/quality.md has what it chooses there.
 struct ChoiceWeights {
+  // The shake of the background and that of all tracks count half each: of the former alone, a near
+  // face may shake more for a calmer wall behind it; long tracks alone may all be on one person.
   double seen = 0.5;   // thousandths of the width: shake far below it is not told from none
   double width = 0.4;  // a hundredth of the source's width that is not shown
-  // By how much frames that are shown as shot must be better than bent ones. Bends follow depth and
-  // the shutter, which this does not measure; where tracks are short they are noise, which it does.
-  double bends = 1;
+  // What the picture's own shape flickers more than the source's counts as shake does; far below
+  // so many thousandths of the width it is not told from none.
+  double wobble = 0.2;
+  // By how much frames that are shown as shot must be better than bent ones: bends follow depth and
+  // the shutter, which the measures see only in part.
+  double bends = 0.5;
+  double change = 0.5;   // by how much other controls must be better than those given
+  double black = 0.001;  // share of a frame; more of it is never chosen where there is a way around
 };
 
-// The better of the solved warps and none, each with its windows; the former alone where
-// `may_leave_warps` is not set.
-Choice Choose(const SolvedClip& clip, const FollowSettings& settings, double frames_per_second,
-              bool may_leave_warps, const ChoiceWeights& weights = {});
+// Whose motion is smoothed away: everybody's, or that of the background or a near subject alone, by
+// leaving out the tracks of the other. Automatic: the background's, where there is a subject and
+// the background shows on most of the frame.
+enum class Still : std::uint8_t { automatic, all, background, subject };
+
+// What was chosen for a clip, and what of.
+struct Choice {
+  Still still = Still::all;  // never automatic
+  double most_zoom = 0;      // that the windows were held to
+  ParamValues given;         // of the parameters that candidates change: as the user has them
+  std::vector<Candidate> candidates;  // at least one; the first is what was asked for
+  std::size_t taken = 0;              // of the candidates
+
+  const Candidate& best() const { return candidates[taken]; }
+  // What was taken, of how many: "method position-scale-rotation, of 7 ways tried".
+  std::string Text() const;
+  // As projects keep it and programs read it: "still", "most_zoom", "given", and "candidates" with
+  // "name", "changes", "taken", "cost" and the names of Outcome::Json.
+  nlohmann::ordered_json Json() const;
+  // None of what is no choice.
+  static std::optional<Choice> Parse(const std::string& text);
+};
+
+// Weighs candidates of one clip against each other, one after the other.
+class Chooser {
+ public:
+  // `clip`: any solve of it, for what the source does.
+  Chooser(const SolvedClip& clip, const FollowSettings& settings, double frames_per_second,
+          const ChoiceWeights& weights = {});
+
+  // Measures a candidate with a solve of it; true where it is the best so far. Its windows are the
+  // best of those that come of some weights of the width, or, `by_best_width`, of the weight of
+  // the best so far.
+  bool Consider(Candidate candidate, const SolvedClip& solved, bool by_best_width = false);
+  // The windows of a candidate that was chosen before, with its solve.
+  void Take(const Choice& choice, const SolvedClip& solved);
+
+  const Choice& choice() const { return choice_; }
+  // Of the best, as WithWindows takes them.
+  const std::vector<Similarity>& windows() const { return windows_; }
+  // Whether the best leaves shake that is worth another try.
+  bool leaves_shake() const;
+
+ private:
+  PictureMotion MotionOf(const Candidate& candidate, const SolvedClip& solved) const;
+  std::vector<Similarity> WindowsOf(const Candidate& candidate, const SolvedClip& solved,
+                                    const PictureMotion& motion) const;
+  // Less is better: first whether black is left, then the cost.
+  std::pair<bool, double> RankOf(const Candidate& candidate) const;
+  double CostOf(const Candidate& candidate) const;
+
+  const FollowSettings settings_;
+  const double frames_per_second_;
+  const ChoiceWeights weights_;
+  const PictureMotion source_;
+  const ShownMotion as_filmed_;
+  Choice choice_;
+  std::vector<Similarity> windows_;
+};
 
 }  // namespace calmframe::host

@@ -52,20 +52,34 @@ CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watc
   const bool may_follow = value(HX_FRAMING) == kCropAutoScale &&
                           value(HX_ACTION_SAFE_MARGIN) == 0 && value(HX_ADDITIONAL_SCALE) > 0;
   // Whoever sets how calm the path is has it so, as far as the effect goes.
+  const auto given = [&](const auto& control) {
+    const Choice* choice = clip.choice();
+    return choice && choice->given.count(control.disk_id) > 0 ? choice->given.at(control.disk_id)
+                                                              : value(control);
+  };
   const bool as_it_comes =
-      value(HX_SMOOTHNESS) == HX_SMOOTHNESS.default_value &&
-      value(HX_CROP_LESS_SMOOTH_MORE) == HX_CROP_LESS_SMOOTH_MORE.default_value &&
-      value(HX_RESULT) == kSmoothMotion;
+      given(HX_SMOOTHNESS) == HX_SMOOTHNESS.default_value &&
+      given(HX_CROP_LESS_SMOOTH_MORE) == HX_CROP_LESS_SMOOTH_MORE.default_value &&
+      given(HX_RESULT) == kSmoothMotion;
   const bool asked = settings.kind == Kind::follow || settings.most_zoom > 0;
   if (asked && !may_follow) {
     throw WindowRefused(
         "a window that follows the picture needs a framing that crops and scales, and no margin");
   }
-  if (settings.kind == Kind::steady || !may_follow || !(asked || as_it_comes)) {
+  if (settings.kind == Kind::steady || !may_follow ||
+      !(asked || (as_it_comes && !settings.as_set))) {
+    if (clip.choice()) {  // it was made for windows that follow
+      clip.ForgetChoice();
+      clip.Work(watcher);
+    }
+    clip.HoldStill(settings.still, watcher);
     return CropTroubleOf(clip);
   }
-  clip.FollowPicture(settings.most_zoom > 0 ? settings.most_zoom : value(HX_MAXIMUM_SCALE) / 100,
-                     watcher);
+  clip.FollowPicture(
+      {.most_zoom = settings.most_zoom > 0 ? settings.most_zoom : value(HX_MAXIMUM_SCALE) / 100,
+       .may_choose = !settings.as_set,
+       .still = settings.still},
+      watcher);
   return {};
 }
 

@@ -12,6 +12,10 @@ struct WindowSettings {
   // where all that shape the path and its window are as they come.
   enum class Kind { by_controls, steady, follow } kind = Kind::by_controls;
   double most_zoom = 0;  // of a window that follows, which it asks for; 0: as Maximum Scale has it
+  // Nothing is chosen: the controls as they are, and a window that follows only where it is asked
+  // for.
+  bool as_set = false;
+  Still still = Still::automatic;
 };
 
 // A window that follows the picture was asked for, and the controls leave no room for it; one line.

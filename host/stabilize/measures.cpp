@@ -22,12 +22,22 @@ std::vector<double> ParabolaWeights(std::ptrdiff_t reach) {
   return weights;
 }
 
+std::ptrdiff_t ReachOf(std::ptrdiff_t frames, double frames_per_second) {
+  const auto reach = std::max<std::ptrdiff_t>(3, std::lround(kReach * frames_per_second));
+  return frames < 2 * reach + 1 ? std::max<std::ptrdiff_t>(2, (frames - 1) / 2) : reach;
+}
+
+double Median(std::vector<double>& values) {
+  const auto middle = values.begin() + static_cast<std::ptrdiff_t>(values.size() / 2);
+  std::nth_element(values.begin(), middle, values.end());
+  return *middle;
+}
+
 }  // namespace
 
 Shake MeasureShake(const ShownMotion& shown, double frames_per_second) {
   const auto frames = static_cast<std::ptrdiff_t>(shown.motions.size());
-  auto reach = std::max<std::ptrdiff_t>(3, std::lround(kReach * frames_per_second));
-  if (frames < 2 * reach + 1) reach = std::max<std::ptrdiff_t>(2, (frames - 1) / 2);
+  const std::ptrdiff_t reach = ReachOf(frames, frames_per_second);
   if (frames < 2 * reach + 1) return {};
   const std::vector<double> weights = ParabolaWeights(reach);
   std::vector<std::array<double, kPlaces * kPlaces>> of_places(
@@ -75,6 +85,43 @@ Shake MeasureShake(const ShownMotion& shown, double frames_per_second) {
   std::sort(shakes.begin(), shakes.end());
   shake.p95 = shakes[std::min(shakes.size() - 1, shakes.size() * 19 / 20)];
   return shake;
+}
+
+double MeasureWobble(const ShownMotion& shown) {
+  double sum = 0;
+  int frames = 0;
+  for (const double wobble : shown.wobble) {
+    if (wobble == 0) continue;
+    sum += wobble;
+    ++frames;
+  }
+  return frames == 0 ? 0 : sum / frames * 1000 / shown.width;
+}
+
+double MeasureTrackShake(const ShownMotion& shown, double frames_per_second) {
+  const std::size_t frames = shown.motions.size();
+  const auto reach =
+      static_cast<std::size_t>(ReachOf(static_cast<std::ptrdiff_t>(frames), frames_per_second));
+  const std::vector<double> weights = ParabolaWeights(static_cast<std::ptrdiff_t>(reach));
+  std::vector<std::vector<double>> of_frames(frames);
+  for (const TrackPath& path : shown.paths) {
+    for (std::size_t middle = reach; middle + reach < path.points.size(); ++middle) {
+      Point off = path.points[middle];
+      for (std::size_t i = 0; i < weights.size(); ++i) {
+        off.x -= weights[i] * path.points[middle - reach + i].x;
+        off.y -= weights[i] * path.points[middle - reach + i].y;
+      }
+      of_frames[path.first + middle].push_back(std::hypot(off.x, off.y) * 1000 / shown.width);
+    }
+  }
+  double sum = 0;
+  int count = 0;
+  for (std::vector<double>& shakes : of_frames) {
+    if (shakes.size() < 3) continue;
+    sum += Median(shakes);
+    ++count;
+  }
+  return count == 0 ? 0 : sum / count;
 }
 
 }  // namespace calmframe::host

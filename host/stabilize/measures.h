@@ -2,7 +2,7 @@
 
 #include <vector>
 
-#include "host/stabilize/similarity.h"
+#include "host/stabilize/picture_motion.h"
 
 namespace calmframe::host {
 
@@ -14,6 +14,8 @@ struct ShownMotion {
   std::vector<Similarity> motions;
   std::vector<double> zooms;      // how many times enlarged each frame shows the source
   std::vector<double> uncovered;  // share of each frame where the source shows nothing, 0 to 1
+  std::vector<double> wobble;     // pixels of the output; see PictureMotion
+  std::vector<TrackPath> paths;   // of the tracks in the output
 };
 
 // Motion that is faster than about 0.9 Hz, in pixels of a picture 1000 wide: how far the path of
@@ -27,5 +29,12 @@ struct Shake {
   double worst_at = 0;  // its middle, in seconds from the first frame
 };
 Shake MeasureShake(const ShownMotion& shown, double frames_per_second);
+
+// Mean over the frames of which it can be told, in thousandths of the width.
+double MeasureWobble(const ShownMotion& shown);
+
+// The same as Shake::mean of what was tracked, near things with far ones: of a frame the median
+// over the tracks that reach so far to either side. 0 where no frame has three of them.
+double MeasureTrackShake(const ShownMotion& shown, double frames_per_second);
 
 }  // namespace calmframe::host

@@ -2,14 +2,32 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstddef>
 #include <cstdio>
+#include <iterator>
 #include <nlohmann/json.hpp>
+#include <stdexcept>
+#include <utility>
 
 namespace calmframe::host {
 
-double Outcome::decibels() const {
+namespace {
+
+constexpr const char* kWindows[] = {"steady", "follow", "none"};  // as Outcome::Window counts
+
+double Rounded(double value) {
+  return std::round(value * 10000) / 10000;
+}
+
+double Decibels(double before, double after) {
   constexpr double kNone = 0.05;  // what nobody sees, and the tracks' own noise
-  return 20 * std::log10(std::max(before.mean, kNone) / std::max(after.mean, kNone));
+  return 20 * std::log10(std::max(before, kNone) / std::max(after, kNone));
+}
+
+}  // namespace
+
+double Outcome::decibels() const {
+  return Decibels(before.mean, after.mean);
 }
 
 std::string Outcome::Text() const {
@@ -22,35 +40,63 @@ std::string Outcome::Text() const {
   char text[256];
   std::snprintf(text, sizeof text,
                 "%.0f %% of the width kept, zoom %.2f at most, %s; shake %.1f -> %.1f per mille of "
-                "the width (%.1f dB %s), at its worst %.1f at %d:%02d%s",
+                "the width (%.1f dB %s), at its worst %.1f at %d:%02d",
                 100 * width_kept, most_zoom, black, before.mean, after.mean, std::abs(decibels()),
-                decibels() < 0 ? "more" : "less", after.worst, seconds / 60, seconds % 60,
-                bends ? "" : "; no frame is bent");
+                decibels() < 0 ? "more" : "less", after.worst, seconds / 60, seconds % 60);
   return text;
 }
 
 nlohmann::ordered_json Outcome::Json() const {
-  const auto rounded = [](double value) { return std::round(value * 10000) / 10000; };
   nlohmann::ordered_json object;
-  object["window"] = follows ? "follow" : "steady";
+  object["window"] = kWindows[static_cast<std::size_t>(window)];
   object["bends"] = bends;
-  object["width_kept"] = rounded(width_kept);
-  object["most_zoom"] = rounded(most_zoom);
-  object["most_black"] = rounded(most_black);
-  object["shake_before"] = rounded(before.mean);
-  object["shake_after"] = rounded(after.mean);
-  object["decibels"] = rounded(decibels());
-  object["worst_shake"] = rounded(after.worst);
-  object["worst_at"] = rounded(after.worst_at);
+  object["width_kept"] = Rounded(width_kept);
+  object["most_zoom"] = Rounded(most_zoom);
+  object["most_black"] = Rounded(most_black);
+  object["shake_before"] = Rounded(before.mean);
+  object["shake_after"] = Rounded(after.mean);
+  // Of what stands here, so that it is the same when it is read and written again.
+  object["decibels"] = Rounded(Decibels(Rounded(before.mean), Rounded(after.mean)));
+  object["worst_shake"] = Rounded(after.worst);
+  object["worst_at"] = Rounded(after.worst_at);
+  object["tracks_before"] = Rounded(tracks_before);
+  object["tracks_after"] = Rounded(tracks_after);
+  object["wobble_before"] = Rounded(wobble_before);
+  object["wobble_after"] = Rounded(wobble_after);
   return object;
 }
 
-Outcome MeasureOutcome(const SolvedClip& clip, const Background& background,
-                       const std::vector<Similarity>& windows, double frames_per_second) {
-  const ShownMotion shown = MotionShown(clip, background, windows);
+Outcome Outcome::Parse(const nlohmann::json& object) {
   Outcome outcome;
-  outcome.before = MeasureShake(MotionOfSource(clip, background), frames_per_second);
+  const auto window = std::find(std::begin(kWindows), std::end(kWindows), object.at("window"));
+  if (window == std::end(kWindows)) throw std::invalid_argument("no window");
+  outcome.window = static_cast<Window>(window - std::begin(kWindows));
+  outcome.bends = object.at("bends").get<bool>();
+  for (const auto& [name, value] : {std::pair{"width_kept", &outcome.width_kept},
+                                    {"most_zoom", &outcome.most_zoom},
+                                    {"most_black", &outcome.most_black},
+                                    {"shake_before", &outcome.before.mean},
+                                    {"shake_after", &outcome.after.mean},
+                                    {"worst_shake", &outcome.after.worst},
+                                    {"worst_at", &outcome.after.worst_at},
+                                    {"tracks_before", &outcome.tracks_before},
+                                    {"tracks_after", &outcome.tracks_after},
+                                    {"wobble_before", &outcome.wobble_before},
+                                    {"wobble_after", &outcome.wobble_after}}) {
+    *value = object.at(name).get<double>();
+  }
+  return outcome;
+}
+
+Outcome MeasureOutcome(const ShownMotion& source, const ShownMotion& shown,
+                       double frames_per_second) {
+  Outcome outcome;
+  outcome.before = MeasureShake(source, frames_per_second);
   outcome.after = MeasureShake(shown, frames_per_second);
+  outcome.wobble_before = MeasureWobble(source);
+  outcome.tracks_before = MeasureTrackShake(source, frames_per_second);
+  outcome.tracks_after = MeasureTrackShake(shown, frames_per_second);
+  outcome.wobble_after = MeasureWobble(shown);
   outcome.width_kept = 0;
   for (std::size_t f = 0; f < shown.zooms.size(); ++f) {
     outcome.width_kept += 1 / shown.zooms[f] / static_cast<double>(shown.zooms.size());

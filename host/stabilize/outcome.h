@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <nlohmann/json_fwd.hpp>
 #include <string>
 
@@ -9,12 +10,15 @@ namespace calmframe::host {
 
 // What a steadied clip shows, as every front end tells it.
 struct Outcome {
-  bool follows = false;  // windows that follow the picture; else the effect's own
+  // The effect's own window, one that follows the picture, or the whole frame as it was filmed.
+  enum class Window : std::uint8_t { steady, follow, none } window = Window::steady;
   bool bends = true;  // frames are warped as the effect solved it; else they are as they were shot
-  double width_kept = 1;  // of the source: mean of what the frames show
-  double most_zoom = 1;   // of the frame that is enlarged most
-  double most_black = 0;  // share of the frame that shows the least, 0 to 1
-  Shake before, after;    // of the source, and of this
+  double width_kept = 1;                       // of the source: mean of what the frames show
+  double most_zoom = 1;                        // of the frame that is enlarged most
+  double most_black = 0;                       // share of the frame that shows the least, 0 to 1
+  Shake before, after;                         // of the source, and of this
+  double wobble_before = 0, wobble_after = 0;  // see MeasureWobble
+  double tracks_before = 0, tracks_after = 0;  // see MeasureTrackShake
 
   // By how much the mean shake has fallen; what nobody sees counts as as little.
   double decibels() const;
@@ -23,10 +27,13 @@ struct Outcome {
   // For programs, an object with all that the line tells and what was chosen: names as above,
   // numbers to four places.
   nlohmann::ordered_json Json() const;
+  // Of such an object, as far as that tells. Throws nlohmann::json::exception,
+  // and std::invalid_argument for a window that there is not.
+  static Outcome Parse(const nlohmann::json& object);
 };
 
-// `windows`: see MotionShown.
-Outcome MeasureOutcome(const SolvedClip& clip, const Background& background,
-                       const std::vector<Similarity>& windows, double frames_per_second);
+// `source`: see MotionOfSource.
+Outcome MeasureOutcome(const ShownMotion& source, const ShownMotion& shown,
+                       double frames_per_second);
 
 }  // namespace calmframe::host

@@ -3,6 +3,8 @@
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <memory>
+#include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -34,6 +36,14 @@ struct Reuse {
 // container promises of them, while the analysis is the first to decode them.
 enum class Opening { decoded, promised };
 
+// How a clip is to be shown by windows that follow its picture.
+struct FollowRequest {
+  double most_zoom = 1.5;  // each frame is enlarged at most so far
+  // Other controls than those that were set are tried as well, and the clip as it was filmed.
+  bool may_choose = true;
+  Still still = Still::automatic;
+};
+
 // A clip on the timeline of a host, with the effect applied to it: opened, worked, framed, measured
 // and saved. For the thread that made it; one at a time in a process, as its host is.
 class SteadyClip {
@@ -48,8 +58,11 @@ class SteadyClip {
   SteadyClip(const std::string& plugin, const Project& project);
 
   // Sets these of the effect's parameters; host().declarations() has them all. What they ask for is
-  // there after the next Work. Throws SolveFailure.
+  // there after the next Work; what was chosen beside the controls before is undone. Throws
+  // SolveFailure.
   void SetControls(const ParamValues& values);
+  // The controls again as they were given, before any choice. Throws SolveFailure.
+  void ForgetChoice();
 
   const std::string& path() const { return info_.path; }
   // As a clip of its own: a part, where only a stretch of it is worked.
@@ -76,10 +89,18 @@ class SteadyClip {
   void SolveAnew(Watcher& watcher);
 
   // After Work, with a framing that crops: from now on what is drawn are the calmest windows that
-  // stay in the picture, enlarged at most so far, in place of the effect's own crop window; and
-  // where that is calmer, the frames as they were shot. What is saved stays as it was. Throws
-  // Interrupted, SolveFailure.
-  void FollowPicture(double most_zoom, Watcher& watcher);
+  // stay in the picture, in place of the effect's own crop window. Where it may choose, parameters
+  // that nobody set are tried on copies of the effect, which solve side by side; the effect becomes
+  // the one that serves the clip best, and what was chosen is saved with it. A choice that was made
+  // before stands as long as controls and request do. Throws Interrupted, SolveFailure.
+  void FollowPicture(const FollowRequest& request, Watcher& watcher);
+  // After Work: solves anew without the tracks of the background or the subject, or with all.
+  // Automatic leaves them as they are. Throws as Work.
+  void HoldStill(Still still, Watcher& watcher);
+  // Null where nothing was to choose.
+  const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }
+  // Made by FollowPicture since it was opened or saved.
+  bool has_new_choice() const { return has_new_choice_; }
   // After Work, with a framing that crops: what the output shows.
   Outcome Measure();
 
@@ -127,7 +148,17 @@ class SteadyClip {
   // Of a parameter, as it was declared. Throws SolveFailure.
   void Set(std::int32_t disk_id, double value);
   // What the effect would save, and what of it is solved. Throws SolveFailure.
-  SolvedClip Solved(SavedEffect* saved);
+  static SolvedClip Solved(Effect& effect, SavedEffect* saved, const std::string& name);
+  // Of its own, for another effect on the same clip.
+  boost::shared_ptr<Layer> LayerOfItsOwn() const;
+  // Whether nobody set a parameter, so that it may be chosen.
+  bool IsFree(std::int32_t disk_id) const;
+  Still HeldOf(Still asked, const SolvedClip& solved) const;
+  void TryControls(Chooser& chooser, Watcher& watcher);
+  // Goes on with a copy that was solved under other controls.
+  void BecomeCopy(Effect& copy, Watcher& watcher);
+  void Draw(const Choice& choice, const std::vector<Similarity>& windows, SavedEffect saved,
+            Watcher& watcher);
   void DrawByItself();
   double FramesPerSecond() const;  // fields, of an interlaced clip
   // At which the effect shows its crop window.
@@ -145,7 +176,9 @@ class SteadyClip {
   Session session_;
   Effect* effect_ = nullptr;  // the session's
   Effect* drawn_ = nullptr;   // the session's; null: the effect itself
-  Outcome outcome_;           // of drawn_
+  std::optional<Choice> choice_;
+  bool has_new_choice_ = false;
+  std::set<std::int32_t> set_;  // disk ids of the parameters that somebody set
   bool has_new_controls_ = false;
   bool analysed_ = false;  // anew, and what is solved of it is still to begin
 };

@@ -8,8 +8,8 @@ namespace calmframe::host {
 struct Progress {
   std::string stage;
   double done = 0, total = 0;  // total 0: nobody knows
-  std::string unit;            // of both; empty for a mere share
-  std::string says;            // what the effect shows its user meanwhile; may be empty
+  std::string unit = {};       // of both; empty for a mere share
+  std::string says = {};       // what the effect shows its user meanwhile; may be empty
   bool ends = false;
   bool lasts = false;  // nothing more may be told for a while
 };

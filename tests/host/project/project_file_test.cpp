@@ -123,7 +123,7 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
   SqliteDatabase(In("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
       .Run("CREATE TABLE t (x)");
   SaveProject(In("newer.calm"), Sample(1));
-  SqliteDatabase(In("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 4");
+  SqliteDatabase(In("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 5");
   SaveProject(In("large.calm"), Sample(1, 5000), 5000);
   EXPECT_TRUE(All(LoadProject(In("large.calm"), 5000)) == All(Sample(1, 5000)));
   const struct {

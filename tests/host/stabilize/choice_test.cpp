@@ -2,8 +2,12 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
+#include <nlohmann/json.hpp>
+#include <optional>
 #include <random>
+#include <string>
 #include <vector>
 
 namespace calmframe::host {
@@ -43,33 +47,83 @@ SolvedClip Filmed(double noise) {
   return clip;
 }
 
-TEST(ChooseTest, BendsAreKeptWhereTheyHelpAndLeftWhereTheyAreNoise) {
-  const Choice good = Choose(Filmed(0), {}, 30, true);
-  EXPECT_EQ(good.warps, Warps::solved);
-  EXPECT_LT(good.outcome.after.mean, 0.05);
-  const Choice bad = Choose(Filmed(15), {}, 30, true);
-  EXPECT_EQ(bad.warps, Warps::none);
-  EXPECT_FALSE(bad.outcome.bends);
-  EXPECT_LT(bad.outcome.after.mean, 0.2);
-  const Choice fixed = Choose(Filmed(15), {}, 30, false);
-  EXPECT_EQ(fixed.warps, Warps::solved);
-  EXPECT_GT(fixed.outcome.after.mean, 2 * bad.outcome.after.mean);
-  for (const Choice* choice : {&good, &bad, &fixed}) {
-    EXPECT_LE(choice->outcome.most_zoom, 1.5 + 1e-3);
-    EXPECT_LT(choice->outcome.most_black, 1e-4);
+const Candidate kBent{.name = "bent"};
+const Candidate kUnbent{.name = "unbent", .warps = Warps::none};
+const Candidate kAsFilmed{.name = "as filmed", .warps = Warps::none, .follows = false};
+
+// The best of these, in this order.
+Choice Best(const SolvedClip& clip, const std::vector<Candidate>& candidates,
+            const FollowSettings& settings = {}) {
+  Chooser chooser(clip, settings, 30);
+  for (const Candidate& candidate : candidates) chooser.Consider(candidate, clip);
+  EXPECT_EQ(chooser.choice().candidates.size(), candidates.size());
+  EXPECT_EQ(chooser.windows().size(), 90u);
+  return chooser.choice();
+}
+
+TEST(ChooserTest, BendsAreKeptWhereTheyHelpAndLeftWhereTheyAreNoise) {
+  const Choice good = Best(Filmed(0), {kUnbent, kBent, kAsFilmed});
+  EXPECT_EQ(good.best().name, "bent");
+  EXPECT_LT(good.best().outcome.after.mean, 0.05);
+  EXPECT_LT(good.best().outcome.wobble_after, 0.01);
+  const Choice bad = Best(Filmed(15), {kBent, kUnbent, kAsFilmed});
+  EXPECT_EQ(bad.best().name, "unbent");
+  EXPECT_LT(bad.best().outcome.after.mean, 0.2);
+  EXPECT_LT(bad.best().outcome.tracks_after, 0.2);
+  const Outcome& noise = bad.candidates[0].outcome;
+  EXPECT_GT(noise.after.mean, 2 * bad.best().outcome.after.mean);
+  EXPECT_GT(noise.wobble_after, 5);
+  for (const Outcome& outcome : {good.best().outcome, bad.best().outcome, noise}) {
+    EXPECT_LE(outcome.most_zoom, 1.5 + 1e-3);
+    EXPECT_LT(outcome.most_black, 1e-4);
   }
 }
 
+// What nothing steadies is better not touched.
+TEST(ChooserTest, WhatIsNoBetterThanTheSourceIsLeftAsItIs) {
+  SolvedClip still = Filmed(15);
+  for (int f = 1; f < still.frame_count; ++f) {  // a tripod's tracks under the shaking hand's warps
+    std::copy_n(still.tracks.begin(), still.slots, still.tracks.begin() + f * still.slots);
+  }
+  const Choice choice = Best(still, {kBent, kAsFilmed});
+  EXPECT_EQ(choice.best().name, "as filmed");
+  EXPECT_NEAR(choice.best().outcome.width_kept, 1, 1e-9);
+  EXPECT_EQ(choice.best().outcome.after.mean, 0);
+}
+
 // The same windows, enlarged or made smaller afterwards.
-TEST(ChooseTest, AnEnlargementComesOnTop) {
+TEST(ChooserTest, AnEnlargementComesOnTop) {
   const SolvedClip clip = Filmed(0);
-  const Outcome plain = Choose(clip, {}, 30, true).outcome;
+  const Outcome plain = Best(clip, {kBent}).best().outcome;
   FollowSettings settings;
   settings.enlarged = 1.25;
-  const Outcome larger = Choose(clip, settings, 30, true).outcome;
+  const Outcome larger = Best(clip, {kBent}, settings).best().outcome;
   EXPECT_NEAR(larger.width_kept * 1.25, plain.width_kept, 1e-6);
   settings.enlarged = 0.8;
-  EXPECT_GT(Choose(clip, settings, 30, true).outcome.most_black, 0.2);
+  EXPECT_GT(Best(clip, {kBent}, settings).best().outcome.most_black, 0.2);
+}
+
+TEST(ChooserTest, ATextBringsTheChoiceBack) {
+  const SolvedClip clip = Filmed(15);
+  Chooser first(clip, {}, 30);
+  first.Consider(kBent, clip);
+  first.Consider({.name = "calmer", .changes = {{20, 80}, {281, 0}}, .warps = Warps::none}, clip);
+  const std::string text = first.choice().Json().dump();
+  const std::optional<Choice> read = Choice::Parse(text);
+  ASSERT_TRUE(read);
+  EXPECT_EQ(read->taken, 1u);
+  EXPECT_EQ(read->best().changes, (ParamValues{{20, 80}, {281, 0}}));
+  EXPECT_EQ(read->Json().dump(), text);
+  Chooser again(clip, {}, 30);
+  again.Take(*read, clip);
+  ASSERT_EQ(again.windows().size(), first.windows().size());
+  for (std::size_t f = 0; f < first.windows().size(); ++f) {
+    EXPECT_EQ(again.windows()[f].dx, first.windows()[f].dx) << f;
+  }
+  for (const char* none : {"", "{}", "[1]", "{\"still\":\"nobody\"}"}) {
+    EXPECT_FALSE(Choice::Parse(none)) << none;
+  }
+  EXPECT_FALSE(Choice::Parse(text.substr(0, text.size() / 2)));
 }
 
 }  // namespace

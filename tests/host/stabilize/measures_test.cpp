@@ -13,7 +13,7 @@ constexpr double kRate = 30, kWidth = 500;
 
 // Ten seconds in which the background's place is at(seconds), in pixels.
 ShownMotion Moving(const std::function<double(double)>& at) {
-  ShownMotion shown{kWidth, 300, {}, {}, {}};
+  ShownMotion shown{kWidth, 300, {}, {}, {}, {}, {}};
   for (int f = 0; f < 300; ++f) {
     shown.motions.push_back({1, 0, at((f - 1) / kRate) - at(f / kRate), 0});
   }
@@ -47,7 +47,7 @@ TEST(MeasureShakeTest, FindsTheWorstSecond) {
 // A turn about the middle moves most places, and so does a change of scale.
 TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
   for (const bool turns : {true, false}) {
-    ShownMotion shown{kWidth, 300, {}, {}, {}};
+    ShownMotion shown{kWidth, 300, {}, {}, {}, {}, {}};
     for (int f = 0; f < 300; ++f) {
       const double step = 0.01 * (f % 2 == 0 ? 1 : -1);
       shown.motions.push_back(turns ? Similarity{1, step, 0, 0} : Similarity{1 + step, 0, 0, 0});
@@ -57,8 +57,23 @@ TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
   }
 }
 
+// Of three tracks that sway the one in the middle counts; one that is too short, and frames near a
+// track's ends, don't.
+TEST(MeasureTrackShakeTest, TakesTheMedianOfTracksThatLast) {
+  ShownMotion shown{kWidth, 300, std::vector<Similarity>(300), {}, {}, {}, {}};
+  for (const double height : {1.0, 4.0, 50.0}) {
+    TrackPath path{40, {}};
+    for (int i = 0; i < 200; ++i) path.points.push_back({3.0 * i, height * Wave(11.3, i / kRate)});
+    shown.paths.push_back(path);
+  }
+  EXPECT_NEAR(MeasureTrackShake(shown, kRate), 8 * 2 / std::numbers::pi, 0.25);
+  for (TrackPath& path : shown.paths) path.points.resize(36);  // 0.6 s to both sides are 37
+  EXPECT_EQ(MeasureTrackShake(shown, kRate), 0);
+}
+
 TEST(MeasureShakeTest, AFewFramesHaveNone) {
-  ShownMotion shown{kWidth, 300, std::vector<Similarity>(4, Similarity{1, 0, 9, 0}), {}, {}};
+  ShownMotion shown{kWidth, 300, std::vector<Similarity>(4, Similarity{1, 0, 9, 0}), {}, {},
+                    {},     {}};
   EXPECT_EQ(MeasureShake(shown, kRate).mean, 0);
   shown.motions.clear();
   EXPECT_EQ(MeasureShake(shown, kRate).worst, 0);

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <nlohmann/json.hpp>
 #include <string>
 #include <vector>
 
@@ -49,22 +50,64 @@ TEST_F(SteadyClipTest, FromAClipToWhatItShowsAndBack) {
     EXPECT_EQ(onlooker.stages, (Texts{"analyzing", "solving"}));
     saved = clip.Saved();
     const Outcome own = clip.Measure();
-    EXPECT_FALSE(own.follows);
+    EXPECT_EQ(own.window, Outcome::Window::steady);
     EXPECT_LT(own.after.mean, own.before.mean / 2);
-    clip.FollowPicture(1.2, onlooker);
+    clip.FollowPicture({.most_zoom = 1.2}, onlooker);
     const Outcome following = clip.Measure();
-    EXPECT_TRUE(following.follows);
+    EXPECT_EQ(following.window, Outcome::Window::follow);
     EXPECT_LT(following.after.mean, following.before.mean / 2);
     EXPECT_LE(following.most_zoom, 1.2 + 1e-3);
     // The picture again without its windows, and by other controls.
     clip.SetControls({{HX_SMOOTHNESS.disk_id, 10}});
     EXPECT_EQ(clip.Work(onlooker).Text(), "reused the analysis");
-    EXPECT_FALSE(clip.Measure().follows);
+    EXPECT_EQ(clip.Measure().window, Outcome::Window::steady);
     EXPECT_GT(clip.Measure().after.mean, own.after.mean);
   }
   SteadyClip again(CALMFRAME_PLUGIN, saved, path_);
   EXPECT_EQ(again.Work(onlooker).Text(), "reused the analysis, the solve and the framing");
   EXPECT_EQ(again.ValueOf(HX_SMOOTHNESS.disk_id), 80);
+}
+
+TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
+  Onlooker onlooker, later;
+  Project saved;
+  std::string chosen;
+  {
+    SteadyClip clip(CALMFRAME_PLUGIN, path_);
+    clip.Work(onlooker);
+    clip.FollowPicture({}, onlooker);
+    EXPECT_EQ(onlooker.stages.back(), "choosing");
+    chosen = clip.choice()->Json().dump();
+    EXPECT_EQ(clip.choice()->candidates[0].name, "as set");
+    EXPECT_GE(clip.choice()->candidates.size(), 3u);
+    saved = clip.Saved();
+    EXPECT_EQ(saved.choice, chosen);
+  }
+  {
+    SteadyClip again(CALMFRAME_PLUGIN, saved, path_);
+    again.Work(later);
+    again.FollowPicture({}, later);
+    EXPECT_EQ(later.stages, Texts{}) << "nothing is solved or chosen";
+    EXPECT_EQ(again.choice()->Json().dump(), chosen);
+    again.FollowPicture({.most_zoom = 1.1}, later);
+    EXPECT_EQ(later.stages.back(), "choosing") << "of another request";
+    EXPECT_LE(again.Measure().most_zoom, 1.1 + 1e-3);
+  }
+  // As if Smoothness had been chosen: who sets another control has it back as it was given.
+  auto made = nlohmann::json::parse(chosen);
+  made["given"]["20"] = 50;
+  for (auto& candidate : made["candidates"]) candidate["changes"]["20"] = 80;
+  saved.effect.values[HX_SMOOTHNESS.disk_id] = 80;
+  saved.choice = made.dump();
+  SteadyClip clip(CALMFRAME_PLUGIN, saved, path_);
+  clip.SetControls({{HX_METHOD.disk_id, 2}});
+  EXPECT_EQ(clip.ValueOf(HX_SMOOTHNESS.disk_id), 50);
+  EXPECT_EQ(clip.choice(), nullptr);
+  clip.Work(later);
+  clip.FollowPicture({}, later);
+  for (const Candidate& candidate : clip.choice()->candidates) {
+    EXPECT_EQ(candidate.changes.count(HX_METHOD.disk_id), 0u) << "set is set: " << candidate.name;
+  }
 }
 
 TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {
