@@ -60,12 +60,13 @@ void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressL
     TellTrouble(host::ChooseFraming(clip, window, progress), clip, progress);
   } catch (const host::WindowRefused&) {
     throw UsageFailure(
-        "a window that follows the picture needs --framing crop-auto-scale and no margin");
+        "a window that follows the picture needs --framing crop-auto-scale or synthesize-edges, "
+        "and no margin");
   }
 }
 
 void TellOutcome(host::SteadyClip& clip, ProgressLine& progress) {
-  if (!host::Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
+  if (!host::Crops(clip.ValueOf(HX_FRAMING.disk_id)) && !clip.choice()) return;
   const host::Outcome outcome = clip.Measure();
   nlohmann::ordered_json object = outcome.Json();
   std::string line = outcome.Text();

@@ -133,8 +133,9 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
       [&](std::size_t i) {
         Candidate& at = tries[i];
         windows[i] = WindowsOf(at, solved, motion);
-        at.outcome = MeasureOutcome(as_filmed_, MotionShown(solved, at.warps, motion, windows[i]),
-                                    frames_per_second_);
+        at.outcome = MeasureOutcome(
+            as_filmed_, MotionShown(solved, at.warps, motion, windows[i], settings_.filling),
+            frames_per_second_);
         at.outcome.window = at.follows ? Outcome::Window::follow : Outcome::Window::none;
         at.outcome.bends = at.warps == Warps::solved;
         at.cost = CostOf(at);

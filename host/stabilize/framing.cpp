@@ -49,9 +49,11 @@ CropTrouble CropTroubleOf(SteadyClip& clip) {
 CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watcher& watcher) {
   using Kind = WindowSettings::Kind;
   const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };
-  const bool may_follow = value(HX_FRAMING) == kCropAutoScale &&
+  const bool fills = value(HX_FRAMING) == kSynthesizeEdges;
+  const bool may_follow = (value(HX_FRAMING) == kCropAutoScale || fills) &&
                           value(HX_ACTION_SAFE_MARGIN) == 0 && value(HX_ADDITIONAL_SCALE) > 0;
-  // Whoever sets how calm the path is has it so, as far as the effect goes.
+  // Whoever sets how calm the path is has it so, as far as the effect goes; filled edges are asked
+  // for to show the frame as it is, whole.
   const auto given = [&](const auto& control) {
     const Choice* choice = clip.choice();
     return choice && choice->given.count(control.disk_id) > 0 ? choice->given.at(control.disk_id)
@@ -64,10 +66,11 @@ CropTrouble ChooseFraming(SteadyClip& clip, const WindowSettings& settings, Watc
   const bool asked = settings.kind == Kind::follow || settings.most_zoom > 0;
   if (asked && !may_follow) {
     throw WindowRefused(
-        "a window that follows the picture needs a framing that crops and scales, and no margin");
+        "a window that follows the picture needs a framing that crops and scales or fills the "
+        "edges, and no margin");
   }
   if (settings.kind == Kind::steady || !may_follow ||
-      !(asked || (as_it_comes && !settings.as_set))) {
+      !(asked || (as_it_comes && !fills && !settings.as_set))) {
     if (clip.choice()) {  // it was made for windows that follow
       clip.ForgetChoice();
       clip.Work(watcher);

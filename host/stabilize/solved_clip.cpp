@@ -6,6 +6,7 @@
 #include <cstring>
 #include <limits>
 #include <string>
+#include <utility>
 
 #include "host/stabilize/solved_payload.h"
 #include "platform/tessel/filesupport.h"
@@ -108,6 +109,16 @@ class Grid {
 
   const std::vector<Point>& vertices() const { return vertices_; }
 
+  // Top left, top right, bottom left, bottom right, as they are stored.
+  Point& corner(std::size_t i) { return vertices_[corners_[i]]; }
+  // The cell that a corner belongs to: its vertices, the way round of its edges.
+  std::array<Point, 4> CellOf(std::size_t corner) const {
+    const std::size_t left = corner % 2 == 0 ? 0 : columns_ - 2;
+    const std::size_t at = (corner < 2 ? 0 : rows_ - 2) * columns_ + left;
+    return {vertices_[at], vertices_[at + 1], vertices_[at + columns_ + 1],
+            vertices_[at + columns_]};
+  }
+
  private:
   // visit(vertex, where the corners' map puts it)
   template <class Visit>
@@ -152,6 +163,98 @@ struct Bounds {
 double Tame(double coordinate) {
   constexpr double kFarthest = 1 << 30;
   return std::clamp(coordinate, -kFarthest, kFarthest);
+}
+
+// -- The bounds' middle --
+
+// One coordinate of a frame's corner, set.
+struct Pull {
+  std::size_t frame, corner;
+  double Point::*axis;
+  double to;
+};
+
+// Whether the effect draws nothing of a cell in a frame of that size: what it draws lies on the
+// inner side of all edges.
+bool IsHidden(const std::array<Point, 4>& cell, double width, double height) {
+  constexpr double kRoom = 2;  // pixels
+  for (std::size_t i = 0; i < cell.size(); ++i) {
+    const Point& from = cell[i];
+    const double dx = cell[(i + 1) % 4].x - from.x, dy = cell[(i + 1) % 4].y - from.y;
+    const auto beyond = [&](double x, double y) {
+      return dx * (y - from.y) - dy * (x - from.x) < -kRoom * std::hypot(dx, dy);
+    };
+    const double right = width - 1, bottom = height - 1;
+    if (beyond(0, 0) && beyond(right, 0) && beyond(0, bottom) && beyond(right, bottom)) return true;
+  }
+  return false;
+}
+
+// The least and the largest coordinate that bounds must have along an axis, for a frame of so many
+// pixels, to place it in their middle; in square pixels, about the frame's first. See
+// ShiftWithoutCrop.
+struct Placement {
+  double least, most;
+  bool most_is_there;
+
+  Placement(double bounds_least, double bounds_most, int square, int pixels) {
+    constexpr double kRounding = 0.01;  // of vertices, more than it is
+    constexpr double kSlack = 0.9;      // the bounds' size is rounded up, and its half down
+    const double scale = static_cast<float>(static_cast<double>(pixels) / square);
+    const double off = (pixels - 1) / 2.0 - (square - 1) / 2.0 * scale;
+    // Not behind the frame's first pixel, for the sake of what WithWindows tells of that.
+    const double before = std::ceil(std::max({-off, -bounds_least * scale - off + kRounding,
+                                              bounds_most * scale + off - pixels - kSlack}));
+    least = -(before + off) / scale;
+    most = least + (pixels + 2 * before) / scale;
+    most_is_there = std::abs(bounds_most - most) * scale < kSlack;
+  }
+};
+
+// What puts the output frame in the bounds' middle; nothing of bounds that are beyond all sense.
+// grid_of(frame): moved to the output.
+template <class GridOf>
+std::vector<Pull> FindPulls(const SolvedLayout& layout, const Bounds& bounds,
+                            const GridOf& grid_of) {
+  constexpr double kWidest = 1 << 20;
+  if (!(bounds.most.x - bounds.least.x < kWidest) || !(bounds.most.y - bounds.least.y < kWidest)) {
+    return {};
+  }
+  const auto width = static_cast<int>(layout.square_width());
+  const int height = layout.source_height;
+  std::vector<Pull> pulls;
+  const auto is_taken = [&](std::size_t frame, std::size_t corner) {
+    return std::any_of(pulls.begin(), pulls.end(), [&](const Pull& pull) {
+      return pull.frame == frame && pull.corner == corner;
+    });
+  };
+  // The first that nobody sees; without one that which goes least far.
+  const auto add = [&](double Point::*axis, double to) {
+    Pull best{};
+    double least = std::numeric_limits<double>::infinity();
+    for (std::size_t f = 0; least > 0 && f < static_cast<std::size_t>(layout.frames); ++f) {
+      Grid& grid = grid_of(f);
+      for (std::size_t corner = 0; corner < 4; ++corner) {
+        if (is_taken(f, corner)) continue;
+        const bool was_hidden = IsHidden(grid.CellOf(corner), width, height);
+        const double from = std::exchange(grid.corner(corner).*axis, to);
+        const bool unseen = was_hidden && IsHidden(grid.CellOf(corner), width, height);
+        grid.corner(corner).*axis = from;
+        const double way = unseen ? 0 : std::abs(to - from);
+        if (!(way < least)) continue;
+        least = way;
+        best = {f, corner, axis, to};
+      }
+    }
+    if (std::isfinite(least)) pulls.push_back(best);
+  };
+  const Placement x(bounds.least.x, bounds.most.x, width, layout.source_width);
+  const Placement y(bounds.least.y, bounds.most.y, height, height);
+  add(&Point::x, x.least);
+  add(&Point::y, y.least);
+  if (!x.most_is_there) add(&Point::x, x.most);
+  if (!y.most_is_there) add(&Point::y, y.most);
+  return pulls;
 }
 
 // -- Windows --
@@ -266,6 +369,14 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
   }
   std::memcpy(clip.statuses.data(), payload.bytes.data() + statuses, layout.cells() * kStatusBytes);
 
+  clip.neighbours.reserve(layout.map_entries);
+  for (std::size_t i = 0; i < layout.map_entries; ++i) {
+    const std::size_t place = layout.map + i * (kMapKeyBytes + kMatrixBytes);
+    const auto frames_of = payload.At<std::array<std::int32_t, 2>>(place);
+    clip.neighbours.push_back(
+        {frames_of[0], frames_of[1], payload.At<std::array<double, 9>>(place + kMapKeyBytes)});
+  }
+
   if (layout.has_crop) {
     const auto fields = payload.At<std::array<std::int32_t, 5>>(layout.crop + 1);
     clip.crop = {.width = fields[3], .height = fields[4], .origin = bounds.least, .windows = {}};
@@ -277,7 +388,8 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
 }
 
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
-                                      const std::vector<Similarity>& windows, Warps warps) {
+                                      const std::vector<Similarity>& windows, Warps warps,
+                                      PlacedBy placed_by) {
   SolvedPayload payload = ReadPayload(instance);
   const SolvedLayout& layout = payload.layout;
   if (windows.size() != static_cast<std::size_t>(layout.frames)) {
@@ -302,6 +414,17 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
     take(f);
     bounds.Add(grid.vertices().data(), columns, rows);
   }
+  std::vector<Pull> pulls;
+  if (placed_by == PlacedBy::bounds) {
+    pulls = FindPulls(layout, bounds, [&](std::size_t f) -> Grid& {
+      take(f);
+      return grid;
+    });
+    for (const Pull& pull : pulls) {
+      bounds.least.*pull.axis = std::min(bounds.least.*pull.axis, pull.to);
+      bounds.most.*pull.axis = std::max(bounds.most.*pull.axis, pull.to);
+    }
+  }
   // The effect draws nothing past the bounds' size, counted from 0 and not from their least: where
   // that lies inside the frame, all goes to the left and up by as much, and the crop with it.
   const Point back = {std::ceil(std::max(Tame(bounds.least.x), 0.0)),
@@ -313,6 +436,9 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
   bounds = {};
   for (std::size_t f = 0; f < windows.size(); ++f) {
     take(f);
+    for (const Pull& pull : pulls) {
+      if (pull.frame == f) grid.corner(pull.corner).*pull.axis = pull.to;
+    }
     grid.Write(payload, place(f));
     grid.Read(payload, place(f));
     bounds.Add(grid.vertices().data(), columns, rows);

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <cstdint>
 #include <optional>
 #include <stdexcept>
@@ -38,6 +39,15 @@ struct SolvedClip {
   std::vector<Point> tracks;
   std::vector<std::int32_t> statuses;
 
+  // What a framing that fills the edges lays behind a frame: another one, whose pixels the matrix
+  // (3 x 3, row by row, of columns x, y, 1) takes to the stabilized plane, where frame `in` stands.
+  // From a file it may be any, and of no number.
+  struct Neighbour {
+    std::int32_t frame, in;
+    std::array<double, 9> plane_from_frame;
+  };
+  std::vector<Neighbour> neighbours;  // by frame, then by where it is laid
+
   // The effect's own framing. `left` to `bottom` from `origin`, both ends included.
   struct Window {
     float left, top, right, bottom;
@@ -69,6 +79,10 @@ std::vector<Point> GridAtRest(const SolvedClip& clip);
 // The clip with all vertices at rest.
 SolvedClip WithoutWarps(SolvedClip clip);
 
+// How the framing places the picture that an instance is loaded under: 2 and 3 by its crop, 1 and 4
+// by the bounds of all frames' outlines.
+enum class PlacedBy { crop, bounds };
+
 // The instance of an effect that shows, of each frame, what windows[frame] tells: it takes points
 // of the output frame to the stabilized plane. What the instance holds besides stays, byte by byte,
 // so that nothing is analysed, solved or framed anew where it is loaded, on a layer of the same
@@ -78,8 +92,12 @@ SolvedClip WithoutWarps(SolvedClip clip);
 // have been saved under the very framing and maximum scale that it is loaded with: otherwise the
 // effect takes what it shows for the plane, and finds a crop of its own there.
 //
-// A framing that does not crop (1 and 4) shows the whole plane about its middle; see
-// ShiftWithoutCrop. Neighbours that fill the edges go with their frame.
+// A framing that does not crop (1 and 4) centres the bounds of all frames' outlines, wherever the
+// output frame lies in them. PlacedBy::bounds puts the output frame in their middle, to the
+// fraction of a pixel: some frame's corner goes as far out as it takes, up to once for each side.
+// It is one of a cell of the frame's grid that the output frame leaves out, before and after, so
+// that nobody sees it; or, where the output frame leaves out none, in any frame, that which goes
+// the least way. Neighbours that fill the edges go with their frame.
 //
 // Vertices are rounded to 1/256 pixel of the output frame. For the effect's sake the plane of the
 // new instance may lie some whole pixels to the left of the output frame, and above; its crop's
@@ -88,14 +106,15 @@ SolvedClip WithoutWarps(SolvedClip clip);
 // where the windows are not one a frame, or one has no inverse.
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
                                       const std::vector<Similarity>& windows,
-                                      Warps warps = Warps::solved);
+                                      Warps warps = Warps::solved,
+                                      PlacedBy placed_by = PlacedBy::crop);
 
 // How far from its place in the output frame a framing that does not crop shows every picture, to
 // the right and downwards, in the source's own pixels, at full render scale and 100 %; of a clip
-// that was read from what WithWindows made. It is the same for all frames: the effect centres the
-// bounds of all frames' outlines, and rounds that to whole pixels for the place of the frame in its
-// buffer. No windows can undo it, since what moves them all moves the bounds too. Throws
-// std::invalid_argument for a clip without windows.
+// that was read from what WithWindows made. It is the same for all frames, and 0 where it was made
+// for PlacedBy::bounds: the effect centres the bounds of all frames' outlines, and rounds that to
+// whole pixels for the place of the frame in its buffer. Windows alone can't undo it, since what
+// moves them all moves the bounds too. Throws std::invalid_argument for a clip without windows.
 Point ShiftWithoutCrop(const SolvedClip& clip);
 
 }  // namespace calmframe::host

@@ -25,7 +25,9 @@ constexpr std::int32_t kCancelButton = 11;
 constexpr std::int32_t kStabilizationGroup = 12;
 constexpr std::int32_t kAutoScaleGroup = 17;  // its name tells the scale
 constexpr std::int32_t kMethod = HX_METHOD.disk_id;
-constexpr std::int32_t kDeblur = 15;  // an experts' group, with a checkbox
+constexpr std::int32_t kDeblur = 15;                         // an experts' group, with a checkbox
+constexpr std::int32_t kSynthesisCuts[] = {31, 32, 33, 34};  // pixels taken off each side
+constexpr std::int32_t kAlphaBoost = 283;
 
 // Where few tracks are, those that leave the others by more than so many pixels of a picture 1000
 // wide count less. Of eight filmed clips' first 6 to 14 frames 2 to 3 kept the most of the width.
@@ -442,6 +444,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   FollowSettings settings;
   settings.most_zoom = request.most_zoom;
   settings.enlarged = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
+  settings.filling = FillingOfEdges();
   const bool stands = choice_ && request.may_choose && choice_->most_zoom == request.most_zoom &&
                       (request.still == Still::automatic || request.still == choice_->still);
   if (stands) {
@@ -459,8 +462,8 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   Progress progress{.stage = "choosing"};
   watcher.Show(progress);
   chooser.Consider({.name = "as set"}, solved);
-  // Whoever asks for a method has its warps; deblurring goes by theirs, too.
-  if (request.may_choose && IsFree(kMethod) && ValueOf(kDeblur) == 0) {
+  // Whoever asks for a method has its warps; what fills the edges and deblurring go by theirs, too.
+  if (request.may_choose && IsFree(kMethod) && ValueOf(kDeblur) == 0 && !settings.filling) {
     chooser.Consider({.name = "not bent", .warps = Warps::none}, solved);
     if (settings.enlarged == 1) {
       chooser.Consider({.name = "as filmed", .warps = Warps::none, .follows = false}, solved);
@@ -532,6 +535,7 @@ void SteadyClip::BecomeCopy(Effect& copy, Watcher& watcher) {
   TakeAsSaved();
   Unseen unseen(watcher);
   const double framing = ValueOf(HX_FRAMING.disk_id);
+  if (!Crops(framing)) return;
   // Its crop window, too, is to be that of the warps as they are saved.
   Set(HX_FRAMING.disk_id, kStabilizeOnly);
   Progress shown;
@@ -544,7 +548,9 @@ void SteadyClip::BecomeCopy(Effect& copy, Watcher& watcher) {
 
 void SteadyClip::Draw(const Choice& choice, const std::vector<Similarity>& windows,
                       SavedEffect saved, Watcher& watcher) {
-  saved.instance = WithWindows(saved.instance, windows, choice.best().warps);
+  const bool crops = Crops(ValueOf(HX_FRAMING.disk_id));
+  saved.instance = WithWindows(saved.instance, windows, choice.best().warps,
+                               crops ? PlacedBy::crop : PlacedBy::bounds);
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
   drawn_ = &session_.Load(LayerOfItsOwn(), saved);
   session_.TickUntilSettled(std::chrono::hours(24), [&] { return watcher.Stops(); });
@@ -573,6 +579,16 @@ Outcome SteadyClip::Measure() {
     outcome.most_black = std::max(outcome.most_black, 1 - across * down);
   }
   return outcome;
+}
+
+std::optional<Filling> SteadyClip::FillingOfEdges() const {
+  if (ValueOf(HX_FRAMING.disk_id) != kSynthesizeEdges) return {};
+  double cut = 0;
+  for (const std::int32_t side : kSynthesisCuts) cut = std::max(cut, ValueOf(side));
+  const double reach = std::round(ValueOf(HX_SYNTHESIS_INPUT_RANGE.disk_id) * FramesPerSecond());
+  return Filling{
+      .reach = static_cast<int>(std::min(reach, double{std::numeric_limits<int>::max()})),
+      .rim = RimOf(cut, ValueOf(HX_SYNTHESIS_EDGE_FEATHER.disk_id), ValueOf(kAlphaBoost))};
 }
 
 double SteadyClip::FramesPerSecond() const {

@@ -88,11 +88,12 @@ class SteadyClip {
   // as Work.
   void SolveAnew(Watcher& watcher);
 
-  // After Work, with a framing that crops: from now on what is drawn are the calmest windows that
-  // stay in the picture, in place of the effect's own crop window. Where it may choose, parameters
-  // that nobody set are tried on copies of the effect, which solve side by side; the effect becomes
-  // the one that serves the clip best, and what was chosen is saved with it. A choice that was made
-  // before stands as long as controls and request do. Throws Interrupted, SolveFailure.
+  // After Work, with a framing that crops or fills the edges: from now on what is drawn are the
+  // calmest windows that stay in the picture, in place of what the effect shows by itself. Where it
+  // may choose, parameters that nobody set are tried on copies of the effect, which solve side by
+  // side; the effect becomes the one that serves the clip best, and what was chosen is saved with
+  // it. A choice that was made before stands as long as controls and request do. Throws
+  // Interrupted, SolveFailure.
   void FollowPicture(const FollowRequest& request, Watcher& watcher);
   // After Work: solves anew without the tracks of the background or the subject, or with all.
   // Automatic leaves them as they are. Throws as Work.
@@ -160,7 +161,8 @@ class SteadyClip {
   void Draw(const Choice& choice, const std::vector<Similarity>& windows, SavedEffect saved,
             Watcher& watcher);
   void DrawByItself();
-  double FramesPerSecond() const;  // fields, of an interlaced clip
+  std::optional<Filling> FillingOfEdges() const;  // of the framing
+  double FramesPerSecond() const;                 // fields, of an interlaced clip
   // At which the effect shows its crop window.
   double Zoom(const SolvedClip& solved) const;
   // Throws SolveFailure where the effect is not ready.

@@ -149,7 +149,8 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
     double most_zoom;
   };
   for (const Run& run : {Run{"", "by itself", 1.5}, Run{"--zoom-at-most 1.15", "limited", 1.15},
-                         Run{"--smoothness 80 --window follow", "asked for", 1.5}}) {
+                         Run{"--smoothness 80 --window follow", "asked for", 1.5},
+                         Run{"--framing synthesize-edges --window follow", "filled", 1.5}}) {
     const std::string told =
         RunWell("stabilize in.mkv out.mkv --codec ffv1 --overwrite " + run.flags);
     const std::size_t at = told.find("zoom ");

@@ -1,7 +1,9 @@
 #include "host/stabilize/solved_clip.h"
 
+#include <algorithm>
 #include <cstring>
 
+#include "host/stabilize/follow_windows.h"
 #include "platform/hx/hx_controls.h"
 #include "tests/contract/played_plugin.h"
 
@@ -52,7 +54,9 @@ class SolvedClipTest : public PlayedPlugin {
   // A second effect, which must have nothing to do.
   Effect& Moved(const Played& played, const Windows& windows) {
     SavedEffect moved = played.saved;
-    moved.instance = WithWindows(moved.instance, windows);
+    const bool crops = moved.values[HX_FRAMING.disk_id] != 4;
+    moved.instance = WithWindows(moved.instance, windows, Warps::solved,
+                                 crops ? PlacedBy::crop : PlacedBy::bounds);
     moved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
     const std::uint64_t analysed = Analysed();
     Effect& effect = session().Load(played.other_layer, moved);
@@ -91,13 +95,13 @@ class SolvedClipTest : public PlayedPlugin {
 };
 
 // One pixel of each cell of a frame's warp must show its place in the source. Cells are so small
-// that three corners tell the map. shift: of the whole picture, in the source's pixels.
-void ExpectCells(const SolvedClip& clip, int row, const Similarity& window, Point shift,
+// that three corners tell the map.
+void ExpectCells(const SolvedClip& clip, int row, const Similarity& window,
                  const WorldBuffer& source, const WorldBuffer& picture) {
   const int width = clip.source_width, height = clip.height;
   const auto vertex = [&](int c, int r) {
     const Point p = Inverse(window)(clip.vertices[(row * clip.rows + r) * clip.columns + c]);
-    return Point{(p.x + 0.5) * width / clip.width - 0.5 + shift.x, p.y + shift.y};
+    return Point{(p.x + 0.5) * width / clip.width - 0.5, p.y};
   };
   double worst = 0;
   int compared = 0;
@@ -176,17 +180,19 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
                            clip.height * (1 - scale) / 2 - 4.3 - 0.41 * f});
       }
       Effect& moved = Moved(played, windows);
-      const Point shift =
-          synthesized ? ShiftWithoutCrop(ReadSolvedClip(Saved(moved).instance)) : Point{};
+      if (synthesized) {
+        const Point shift = ShiftWithoutCrop(ReadSolvedClip(Saved(moved).instance));
+        EXPECT_NEAR(std::hypot(shift.x, shift.y), 0, 1e-4);  // windows are floats
+      }
       const auto picture = moved.MakeRenderer()->Planned({kRow}).OnLayer();
-      ExpectCells(clip, kRow, windows[kRow], shift, *SourceFrame(*played.effect, kRow + c.start),
+      ExpectCells(clip, kRow, windows[kRow], *SourceFrame(*played.effect, kRow + c.start),
                   *picture);
       // Beside the frame neighbours show what the camera saw then, or nothing does.
       double sum = 0;
       int filled = 0;
       for (int i = 0; i < clip.source_width * clip.height; ++i) {
         const int x = i % clip.source_width, y = i / clip.source_width;
-        const Point p = windows[kRow]({(x - shift.x + 0.5) * aspect - 0.5, y - shift.y});
+        const Point p = windows[kRow]({(x + 0.5) * aspect - 0.5, double(y)});
         const Point from = {(p.x - corner.x) / aspect, p.y - corner.y};
         const HX_Pixel8& pixel = picture->row<HX_Pixel8>(y)[x];
         const bool beside = std::min(from.x, from.y) < -4 || from.x > clip.source_width + 3 ||
@@ -199,6 +205,58 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
       EXPECT_LE(sum, filled * 8);
     }
   }
+}
+
+// Windows that leave their frames show there, by both framings, the very same picture, and beside
+// it what the frames around have.
+TEST_F(SolvedClipTest, FilledEdgesLeaveNothingOpen) {
+  Played cropped = Play({"one", 3, 2}), filled = Play({"one", 4, 2});
+  const SolvedClip& clip = filled.clip;
+  ASSERT_TRUE(clip.vertices == cropped.clip.vertices);
+  const PictureMotion motion = FindMotion(clip, Warps::solved);
+  const auto width_kept = [&](const FollowSettings& settings) {
+    double sum = 0;
+    for (const Similarity& w : FollowWindows(clip, Warps::solved, motion, settings)) sum += w.a;
+    return sum / clip.frame_count;
+  };
+  for (const double feather : {0.0, 20.0}) {
+    SCOPED_TRACE(feather);
+    filled.saved.values[HX_SYNTHESIS_EDGE_FEATHER.disk_id] = feather;
+    FollowSettings settings;
+    settings.filling = Filling{12, RimOf(0, feather, 5)};
+    EXPECT_GT(width_kept(settings), width_kept({}) + 0.02);
+    const Windows windows = FollowWindows(clip, Warps::solved, motion, settings);
+    const auto by_crop = Moved(cropped, windows).MakeRenderer(),
+               by_fill = Moved(filled, windows).MakeRenderer();
+    int beside = 0, open = 0, others = 0;
+    for (int f = 0; f < clip.frame_count; ++f) {
+      const auto own = by_crop->Planned({f, 16}).OnLayer(),
+                 all = by_fill->Planned({f, 16}).OnLayer();
+      const Point* const corner = clip.vertices.data() + f * clip.columns * clip.rows;
+      const Point far = corner[clip.columns * clip.rows - 1];
+      for (int i = 0; i < clip.width * clip.height; ++i) {
+        const int x = i % clip.width, y = i / clip.width;
+        const HX_Pixel16& a = own->row<HX_Pixel16>(y)[x];
+        const HX_Pixel16& b = all->row<HX_Pixel16>(y)[x];
+        beside += a.alpha == 0;
+        open += b.alpha < 32760;
+        const Point p = windows[f]({double(x), double(y)});
+        const double inside =
+            std::min({p.x - corner->x, p.y - corner->y, far.x - p.x, far.y - p.y});
+        others +=
+            inside > feather + 5 && a.alpha > 0 && std::abs(a.red - b.red) > 40;  // 32768 is white
+      }
+    }
+    EXPECT_GT(beside, 5000);
+    EXPECT_EQ(open, 0);
+    EXPECT_EQ(others, 0);
+    const ShownMotion shown = MotionShown(clip, Warps::solved, motion, windows, settings.filling);
+    EXPECT_LT(*std::max_element(shown.uncovered.begin(), shown.uncovered.end()), 0.001);
+  }
+  // What nobody has is told: windows that show more than all frames together.
+  FilledPlane plane(clip, {12, 2.5});
+  EXPECT_GT(plane.UncoveredShare(5, {1.5, 0, 0, 0}), 0.2);
+  EXPECT_TRUE(plane.RegionAround(5, {1.5, 0, 0, 0}).empty());
 }
 
 // The payload's length goes with the bytes.
@@ -241,7 +299,7 @@ TEST_F(SolvedClipTest, PerspectiveWarps) {
     ASSERT_NEAR(std::hypot(b.x - p.x, b.y - p.y), 0, 0.003) << i;
   }
   Effect& effect = Moved(played, Windows(16, turn));  // which sees it so too
-  ExpectCells(turned, 0, turn, {}, *SourceFrame(effect, 0),
+  ExpectCells(turned, 0, turn, *SourceFrame(effect, 0),
               *effect.MakeRenderer()->Planned({0}).OnLayer());
 }
 
