@@ -53,7 +53,7 @@ struct Choice {
   std::size_t taken = 0;              // of the candidates
 
   const Candidate& best() const { return candidates[taken]; }
-  // What was taken, of how many: "method position-scale-rotation, of 7 ways tried".
+  // What was taken, of how many: "method position-scale-rotation, best of 5".
   std::string Text() const;
   // What the next best is worse at, and better: "next comes as set, 1.2 decibels behind: it keeps
   // less of the width (79 % against 85 %)"; empty where there is no other whose windows follow, and

@@ -13,7 +13,6 @@
 
 #include "host/stabilize/control_items.h"
 #include "host/stabilize/failures.h"
-#include "host/stabilize/motion_groups.h"
 #include "platform/hx/hx_controls.h"
 
 namespace calmframe::host {
@@ -33,8 +32,8 @@ constexpr double kTransitionBisquareSigma = 3;
 
 // What is tried where the controls leave shake, each by itself. Of the others, the other methods
 // differ little from these or from frames that are not bent once the windows follow the picture;
-// the enhanced ripple setting and conservative factorization off bent five of eight filmed clips
-// worse, and none better.
+// the enhanced ripple setting and conservative factorization off were better on none of five
+// filmed clips.
 struct Trial {
   const char* name;
   std::int32_t disk_id;
@@ -422,29 +421,24 @@ bool SteadyClip::IsFree(std::int32_t disk_id) const {
 
 void SteadyClip::HoldStill(Still still, Watcher& watcher) {
   if (still == Still::automatic) return;
+  const SolvedClip solved = Solved();
+  LeaveOut(still, solved, still == Still::all ? MotionGroups() : FindMotionGroups(solved), watcher);
+}
+
+void SteadyClip::LeaveOut(Still still, const SolvedClip& solved, const MotionGroups& groups,
+                          Watcher& watcher) {
   std::vector<TrackPoint> left_out;
-  if (still != Still::all) {
-    const SolvedClip solved = Solved();
-    const MotionGroups groups = FindMotionGroups(solved);
-    if (groups.has_subject) {
-      left_out =
-          TracksOf(solved, groups,
-                   still == Still::background ? MotionGroup::subject : MotionGroup::background);
-    } else if (still == Still::subject) {
-      watcher.Warn(path() + ": nothing near moves against what is behind it; no track is left out");
-    }
+  if (still != Still::all && groups.has_subject) {
+    left_out =
+        TracksOf(solved, groups,
+                 still == Still::background ? MotionGroup::subject : MotionGroup::background);
+  } else if (still == Still::subject) {
+    watcher.Warn(path() + ": nothing near moves against what is behind it; no track is left out");
   }
   const CommandResult result = effect_->DeleteTracks(left_out);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
   held_ = still;
   Work(watcher);
-}
-
-Still SteadyClip::HeldOf(Still asked, const SolvedClip& solved) const {
-  if (asked != Still::automatic) return asked;
-  constexpr double kCovers = 0.5;  // of the frame: less of the background hardly holds a picture
-  const MotionGroups groups = FindMotionGroups(solved);
-  return groups.has_subject && groups.background_cover > kCovers ? Still::background : Still::all;
 }
 
 void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
@@ -471,9 +465,15 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
     return Draw(*choice_, chooser.windows(), std::move(saved), watcher);
   }
   const bool as_set = !request.may_choose && request.still == Still::automatic;
-  const Still still = as_set ? Still::all : HeldOf(request.still, solved);
+  Still still = as_set ? Still::all : request.still;
+  const MotionGroups groups = still == Still::all ? MotionGroups() : FindMotionGroups(solved);
+  if (still == Still::automatic) {
+    constexpr double kCovers = 0.5;  // of the frame: less of the background hardly holds a picture
+    still =
+        groups.has_subject && groups.background_cover > kCovers ? Still::background : Still::all;
+  }
   if (still != Still::all || held_ != Still::all) {
-    HoldStill(still, watcher);
+    LeaveOut(still, solved, groups, watcher);
     solved = Solved(*effect_, &saved, path());
   }
   Chooser chooser(solved, settings);
@@ -484,8 +484,14 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   if (request.may_choose && IsFree(kMethod) && ValueOf(kDeblur) == 0) {
     chooser.Consider({.name = "not bent", .warps = Warps::none}, solved, true);
   }
-  if (request.may_choose && chooser.leaves_shake()) TryControls(chooser, watcher);
+  Effect* copy = nullptr;
+  if (request.may_choose && chooser.leaves_shake()) copy = TryControls(saved, chooser, watcher);
   if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved);
+  if (copy && chooser.choice().best().changes.empty()) {  // then the controls stay, too
+    session_.Remove(*copy);
+  } else if (copy) {
+    BecomeCopy(*copy, watcher);
+  }
   choice_ = chooser.choice();
   has_new_choice_ = true;
   choice_->still = still;
@@ -502,9 +508,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   Draw(*choice_, chooser.windows(), std::move(saved), watcher);
 }
 
-void SteadyClip::TryControls(Chooser& chooser, Watcher& watcher) {
-  SavedEffect saved;
-  Solved(*effect_, &saved, path());
+Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watcher& watcher) {
   std::vector<const Trial*> trials;
   for (const Trial& trial : kTrials) {
     if (IsFree(trial.disk_id)) trials.push_back(&trial);
@@ -544,7 +548,7 @@ void SteadyClip::TryControls(Chooser& chooser, Watcher& watcher) {
       throw Interrupted();
     }
   }
-  if (best) BecomeCopy(*best, watcher);
+  return best;
 }
 
 void SteadyClip::BecomeCopy(Effect& copy, Watcher& watcher) {

@@ -14,6 +14,7 @@
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
 #include "host/stabilize/choice.h"
+#include "host/stabilize/motion_groups.h"
 #include "host/stabilize/shown_path.h"
 #include "host/stabilize/watcher.h"
 #include "host/timeline/source.h"
@@ -160,8 +161,10 @@ class SteadyClip {
   bool IsFree(std::int32_t disk_id) const;
   // The controls as they were given; the tracks that are left out stay so.
   void UndoChoice();
-  Still HeldOf(Still asked, const SolvedClip& solved) const;
-  void TryControls(Chooser& chooser, Watcher& watcher);
+  void LeaveOut(Still still, const SolvedClip& solved, const MotionGroups& groups,
+                Watcher& watcher);
+  // `saved`: the effect. The copy that is better than all considered before; null: none is.
+  Effect* TryControls(const SavedEffect& saved, Chooser& chooser, Watcher& watcher);
   // Goes on with a copy that was solved under other controls.
   void BecomeCopy(Effect& copy, Watcher& watcher);
   void Draw(const Choice& choice, const std::vector<Similarity>& windows, SavedEffect saved,
