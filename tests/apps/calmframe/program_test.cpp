@@ -106,10 +106,13 @@ TEST_F(ProgramTest, APipeGetsWhatItsCodecNeedsAndIsToldOfEachTagThatIsDropped) {
 
 TEST_F(ProgramTest, PipesAndPicturesGoInAndPicturesComeOut) {
   MakeClip("in.mp4", 64, 48, 5);
-  RunWell("stabilize in.mp4 file.mkv --quiet");
+  // Lossless: x264's choices for so small a picture go by what its memory held before.
+  RunWell("stabilize in.mp4 file.mkv --quiet --codec ffv1");
   for (const std::string name : {"-", "/dev/stdin"}) {
-    EXPECT_EQ(Run("stabilize " + name + " piped.mkv --quiet --overwrite", "cat in.mp4 | ").text,
-              "");
+    EXPECT_EQ(
+        Run("stabilize " + name + " piped.mkv --quiet --overwrite --codec ffv1", "cat in.mp4 | ")
+            .text,
+        "");
     EXPECT_TRUE(SamePixels(ReadFrame(*ClipReader::Open(Path("piped.mkv")), 4),
                            ReadFrame(*ClipReader::Open(Path("file.mkv")), 4)));
   }
