@@ -29,8 +29,8 @@ add_compile_options(-Wall -Wextra -Wshadow -Wconversion -Wno-sign-conversion -ff
 if(CALMFRAME_WERROR)
   add_compile_options(-Werror)
 endif()
-# Several sources as one, the checks' way to read every header fewer times: none of them is the main file any more, which
-# is where GCC lets a type have members of an unnamed namespace.
+# Several sources as one, the way of all presets but debug's to read every header fewer times: none of them is the main file
+# any more, which is where GCC lets a type have members of an unnamed namespace.
 if(CMAKE_UNITY_BUILD AND CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
   add_compile_options($<$<COMPILE_LANGUAGE:CXX>:-Wno-subobject-linkage>)
 endif()
