@@ -29,6 +29,9 @@ add_compile_options(-Wall -Wextra -Wshadow -Wconversion -Wno-sign-conversion -ff
 if(CALMFRAME_WERROR)
   add_compile_options(-Werror)
 endif()
+# Some compilers say so by themselves. A library that nothing calls brings others along: one of FFmpeg's loads OpenBLAS into
+# the program, whose threads wait for ever at its end where memory is short.
+add_link_options(-Wl,--as-needed)
 # Several sources as one, the way of all presets but debug's to read every header fewer times: none of them is the main file
 # any more, which is where GCC lets a type have members of an unnamed namespace.
 if(CMAKE_UNITY_BUILD AND CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
