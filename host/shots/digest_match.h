@@ -1,0 +1,49 @@
+#pragma once
+
+#include <optional>
+
+#include "host/shots/frame_digest.h"
+
+namespace calmframe::host {
+
+// In cells of a digest: what one frame shows at (x, y) the other shows at (x + shift.x, ...).
+struct CellShift {
+  int x = 0, y = 0;
+  bool operator==(const CellShift&) const = default;
+};
+inline CellShift operator+(CellShift a, CellShift b) {
+  return {a.x + b.x, a.y + b.y};
+}
+inline CellShift operator-(CellShift a, CellShift b) {
+  return {a.x - b.x, a.y - b.y};
+}
+
+struct DigestMatch {
+  CellShift shift;  // from the first to the second, of the frame as a whole
+  // How much of what the frames show differs once the second is laid over the first, 0 to 1: the
+  // mean over blocks of the residual's share in the contrast. Light may change by a gain of the
+  // frame and an offset of each block, and each block may lie a little beside the others. Blocks
+  // without contrast count for little; two frames without any are alike.
+  double difference = 0;
+};
+
+// Looks for shifts by up to half of the frame, so that frames of a quick pan are laid over each
+// other. Some 0.1 ms.
+DigestMatch MatchOf(const FrameDigest& first, const FrameDigest& second);
+
+// A frame as first_weight * A + second_weight * B + an offset, by least squares over where both
+// lie, each at its best place. What is left over is a share of the frame's contrast, 0 to 1.
+struct Mixture {
+  double first_weight = 0, second_weight = 0;
+  double left = 1;                         // by both
+  double first_left = 1, second_left = 1;  // by A alone, by B alone
+};
+
+// Where A and B lie in the frame is looked for about the places that the motion from frame to frame
+// gives. `worth`: nothing is fitted where A or B alone leave less than that. None where A and B
+// share less than half of the frame with it.
+std::optional<Mixture> MixtureOf(const FrameDigest& a, const FrameDigest& frame,
+                                 const FrameDigest& b, CellShift frame_from_a,
+                                 CellShift frame_from_b, double worth);
+
+}  // namespace calmframe::host
