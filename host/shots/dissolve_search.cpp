@@ -14,8 +14,9 @@ constexpr std::int64_t kWidths[] = {2, 4, 8, 14, 20};
 // them, a quarter of these within one clip.
 // What either frame alone must leave of the one between: less is a picture that moved a little.
 constexpr double kAlone = 0.06;
-// What the mixture may leave of that: 0.04 to 0.35 in dissolves.
-constexpr double kLeft = 0.4;
+// What the mixture may leave of that: 0.04 to 0.35 in dissolves; over the shortest way, which a
+// near thing may cross, 0.25 in short dissolves, which are over by then.
+constexpr double kLeft = 0.4, kLeftOfShortest = 0.25;
 // The weights' sum: light may change a little on the way.
 constexpr double kSum[2] = {0.7, 1.3};
 // The share of the frame behind: in the middle the mixture tells most.
@@ -27,6 +28,12 @@ constexpr double kGrowth = 0.08;
 constexpr double kStrong = 0.3;
 constexpr double kWeak = 0.06;  // is still a part of a dissolve
 
+// Of what either frame alone leaves: so much can be seen well.
+constexpr double kFull = 0.2;
+// How far beyond the frames that are surely in a dissolve its ends are looked for, in steps.
+constexpr std::int64_t kBeyond = 22;
+constexpr double kSure = 0.25;  // of the strength of the best
+
 double ShareOf(const Mixture& m) {
   return m.second_weight / (m.first_weight + m.second_weight);
 }
@@ -37,29 +44,49 @@ std::optional<Mixture> MixtureAt(const FrameHistory& history, std::int64_t a, st
                    history.Motion(a, frame), history.Motion(b, frame), worth);
 }
 
-struct Ramp {
-  double start = 0, end = 0;  // frames where the share leaves 0 and reaches 1
+// Three frames evenly apart, by steps from one that all count from, and how much of the last is in
+// the middle one beside the first.
+struct Triple {
+  std::int64_t first, middle, last;
+  double share;
+  double weight;  // how much there is to see, 0 to 1
 };
 
-// The straight ramp from 0 to 1 that fits the shares best, by least squares over all pairs of
-// frames.
-Ramp FitRamp(const std::vector<double>& shares, std::int64_t first, std::int64_t step) {
-  Ramp best;
+// How much of the shot behind is in a frame, if the first pure frames of both are these.
+double ShareIn(std::int64_t frame, std::int64_t pure_before, std::int64_t pure_behind) {
+  return std::clamp(
+      static_cast<double>(frame - pure_before) / static_cast<double>(pure_behind - pure_before),
+      0.0, 1.0);
+}
+
+struct Span {
+  std::int64_t before = 0, behind = 0;  // the last pure frame of one shot, the first of the other
+};
+
+// The straight ramp that explains the triples best: least squares, of which no triple adds more
+// than one that the ramp says nothing about, since shake spoils some.
+Span BestSpan(const std::vector<Triple>& triples, std::int64_t count, std::int64_t first_sure,
+              std::int64_t last_sure) {
+  constexpr double kMost = 0.2 * 0.2;
+  constexpr double kLeastChange = 0.1;
+  Span best;
   double least = 1e30;
-  const auto n = static_cast<std::int64_t>(shares.size());
-  for (std::int64_t i = 0; i < n; ++i) {
-    for (std::int64_t j = i + 1; j < n; ++j) {
+  for (std::int64_t before = 0; before < first_sure; ++before) {
+    for (std::int64_t behind = last_sure + 1; behind < count; ++behind) {
       double sum = 0;
-      for (std::int64_t k = 0; k < n; ++k) {
-        const double share = shares[static_cast<std::size_t>(k)];
-        if (std::isnan(share)) continue;
-        const double ramp =
-            std::clamp(static_cast<double>(k - i) / static_cast<double>(j - i), 0.0, 1.0);
-        sum += (share - ramp) * (share - ramp);
+      for (const Triple& t : triples) {
+        const double at_first = ShareIn(t.first, before, behind);
+        const double change = ShareIn(t.last, before, behind) - at_first;
+        double miss = kMost;
+        if (change > kLeastChange) {
+          const double off = t.share - (ShareIn(t.middle, before, behind) - at_first) / change;
+          miss = std::min(kMost, off * off);
+        }
+        sum += t.weight * miss;
       }
       if (sum < least) {
         least = sum;
-        best = {static_cast<double>(first + step * i), static_cast<double>(first + step * j)};
+        best = {before, behind};
       }
     }
   }
@@ -85,7 +112,8 @@ std::optional<DissolveSearch::Hit> DissolveSearch::HitAt(const FrameHistory& his
     if (!whole) continue;
     const double alone = std::min(whole->first_left, whole->second_left);
     const double sum = whole->first_weight + whole->second_weight, share = ShareOf(*whole);
-    if (!(whole->left < kLeft * alone && sum > kSum[0] && sum < kSum[1] && share > kShare[0] &&
+    const double most_left = steps == kWidths[0] ? kLeftOfShortest : kLeft;
+    if (!(whole->left < most_left * alone && sum > kSum[0] && sum < kSum[1] && share > kShare[0] &&
           share < kShare[1])) {
       continue;
     }
@@ -142,36 +170,37 @@ std::optional<ShotBorder> DissolveSearch::BorderOf(const FrameHistory& history) 
   // Three frames in a row are no accident, but of the shortest dissolves there are no more.
   if (best.strength < kStrong || (hits_.size() < 3 && best.width > 2 * step_)) return {};
 
-  // From frames that are before the dissolve and behind it, as far as the picture can be followed,
-  // the shares of all between.
-  for (std::int64_t width = reach(); width >= best.width; width -= 2 * step_) {
-    const std::int64_t a = std::max({best.frame - width, best.first, history.first()});
-    const std::int64_t b = std::min({best.frame + width, best.end - 1, history.end() - 1});
-    std::vector<double> shares;
-    int known = 0;
-    for (std::int64_t f = a; f <= b; f += step_) {
-      double share = NAN;
-      if (const std::optional<Mixture> m = MixtureAt(history, a, f, b, 0)) {
-        const double sum = m->first_weight + m->second_weight;
-        if (sum > kSum[0] && sum < kSum[1] && m->left < 0.5) {
-          share = std::clamp(ShareOf(*m), 0.0, 1.0);
-          ++known;
-        }
-      }
-      shares.push_back(share);
-    }
-    if (known < static_cast<int>(shares.size()) * 2 / 3) continue;
-    const Ramp ramp = FitRamp(shares, a, step_);
-    ShotBorder border;
-    border.kind = ShotBorder::Kind::dissolve;
-    // At the ramp's ends the frames are still pure.
-    border.first = std::llround(ramp.start) + 1;
-    border.last = std::max(border.first, static_cast<std::int64_t>(std::llround(ramp.end)) - 1);
-    border.frame = (border.first + border.last + 1) / 2;
-    border.confidence = 1 - 0.5 * kStrong / best.strength;
-    return border;
+  std::int64_t first_sure = best.frame, last_sure = best.frame;
+  for (const Hit& hit : hits_) {
+    if (hit.strength < kSure * best.strength) continue;
+    first_sure = std::min(first_sure, hit.frame);
+    last_sure = std::max(last_sure, hit.frame);
   }
-  return {};
+  const std::int64_t first = std::max({best.first, history.first(), first_sure - kBeyond * step_});
+  const std::int64_t end = std::min({best.end, history.end(), last_sure + kBeyond * step_ + 1});
+  std::vector<Triple> triples;
+  for (const std::int64_t width : kWidths) {
+    for (std::int64_t f = first + width * step_; f + width * step_ < end; f += step_) {
+      const std::int64_t a = f - width * step_, b = f + width * step_;
+      const std::optional<Mixture> m = MixtureAt(history, a, f, b, 0);
+      if (!m) continue;
+      const double alone = std::max(m->first_left, m->second_left);
+      const double sum = m->first_weight + m->second_weight;
+      const std::int64_t at = (a - first) / step_;
+      if (!(m->left < kLeft * alone && alone > kAlone && sum > kSum[0] && sum < kSum[1])) continue;
+      triples.push_back({at, at + width, at + 2 * width, std::clamp(ShareOf(*m), 0.0, 1.0),
+                         std::min(1.0, alone / kFull)});
+    }
+  }
+  const Span span = BestSpan(triples, (end - first + step_ - 1) / step_,
+                             (first_sure - first) / step_, (last_sure - first) / step_);
+  ShotBorder border;
+  border.kind = ShotBorder::Kind::dissolve;
+  border.first = first + span.before * step_ + 1;
+  border.last = first + span.behind * step_ - 1;
+  border.frame = (border.first + border.last + 1) / 2;
+  border.confidence = 1 - 0.5 * kStrong / best.strength;
+  return border;
 }
 
 }  // namespace calmframe::host

@@ -18,14 +18,27 @@ constexpr double kFaint[2] = {0.3, 0.75};
 // Differences, see DigestMatch: of a picture to itself, faint; of two pictures.
 constexpr double kItself = 0.25, kOther = 0.12;
 
+// Whether the frames from a picture to a plain one, `count` away and behind it or before it, show
+// it fainter at first, where any are between: whoever pans over a wall has a plain picture too.
+bool FadesFrom(const FrameHistory& history, std::int64_t picture, std::int64_t count) {
+  const std::int64_t step = count < 0 ? -1 : 1;
+  for (std::int64_t f = picture + step; f != picture + count; f += step) {
+    if (!history.Holds(f)) break;
+    const double part = history.contrast(f) / history.contrast(picture);
+    if (part > kFaint[0] && part < kFaint[1]) return history.Difference(picture, f) < kItself;
+  }
+  return true;
+}
+
 }  // namespace
 
 FadeWatch::FadeWatch(double frames_per_second)
     : second_(std::clamp<std::int64_t>(std::llround(frames_per_second), 10, 240)) {}
 
-void FadeWatch::Begin(const FrameHistory& history, std::int64_t frame) {
+void FadeWatch::Begin(const FrameHistory& history, std::int64_t first) {
+  const std::int64_t frame = history.end() - 1;
   double most = 0;
-  for (std::int64_t f = std::max(history.first(), frame - second_); f < frame; ++f) {
+  for (std::int64_t f = std::max({first, history.first(), frame - second_}); f < frame; ++f) {
     most = std::max(most, history.contrast(f));
   }
   if (!(most > 2 * kPlain && history.contrast(frame) < kLow * most)) return;
@@ -35,18 +48,10 @@ void FadeWatch::Begin(const FrameHistory& history, std::int64_t frame) {
   while (history.contrast(before_frame_) < kWhole * most) --before_frame_;
   before_ = history.digest(before_frame_);
   before_contrast_ = history.contrast(before_frame_);
-  // Cut to the plain picture, or fading to it.
-  before_fades_ = true;
-  for (std::int64_t f = before_frame_ + 1; f < frame; ++f) {
-    const double part = history.contrast(f) / before_contrast_;
-    if (part > kFaint[0] && part < kFaint[1] &&
-        MatchOf(before_, history.digest(f)).difference > kItself) {
-      before_fades_ = false;
-    }
-  }
+  before_fades_ = FadesFrom(history, before_frame_, frame - before_frame_);
 }
 
-std::optional<ShotBorder> FadeWatch::Next(const FrameHistory& history) {
+std::optional<ShotBorder> FadeWatch::Next(const FrameHistory& history, std::int64_t first) {
   const std::int64_t frame = history.end() - 1;
   const double contrast = history.contrast(frame);
   std::optional<ShotBorder> border;
@@ -59,7 +64,9 @@ std::optional<ShotBorder> FadeWatch::Next(const FrameHistory& history) {
     border = Judge(history);
     state_ = State::clear;
   }
-  if (state_ == State::clear) Begin(history, frame);
+  // There was a cut to a picture of less contrast.
+  if (state_ != State::clear && first > before_frame_) state_ = State::clear;
+  if (state_ == State::clear) Begin(history, first);
   if (state_ != State::low) return border;
 
   if (contrast < least_) least_ = contrast;
@@ -92,11 +99,7 @@ std::optional<ShotBorder> FadeWatch::Judge(const FrameHistory& history) const {
   if (!(least_ < kLow * std::min(before_contrast_, most)) || !before_fades_) return {};
   std::int64_t behind = rise_;
   while (history.contrast(behind) < kWhole * most) ++behind;
-  for (std::int64_t f = plain_last_ + 1; f < behind; ++f) {
-    if (!history.Holds(f)) continue;
-    const double part = history.contrast(f) / most;
-    if (part > kFaint[0] && part < kFaint[1] && history.Difference(f, behind) > kItself) return {};
-  }
+  if (!FadesFrom(history, behind, plain_last_ - behind)) return {};
   // The same picture goes on behind a flash or a frame that was lost.
   const bool short_one = plain_last_ - plain_first_ < second_ / 4;
   const double difference = MatchOf(before_, history.digest(behind)).difference;

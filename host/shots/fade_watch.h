@@ -17,15 +17,16 @@ class FadeWatch {
   // How many frames it needs of the history.
   std::int64_t memory() const { return 2 * second_; }
 
-  // Takes the history's last frame. A fade that is over by now, if there is one.
-  std::optional<ShotBorder> Next(const FrameHistory& history);
+  // Takes the history's last frame. `first`: with which its shot begins, as far as cuts tell. A
+  // fade that is over by now, if there is one.
+  std::optional<ShotBorder> Next(const FrameHistory& history, std::int64_t first);
   // No more frames.
   std::optional<ShotBorder> Finish(const FrameHistory& history);
 
  private:
   enum class State { clear, low, rising };
 
-  void Begin(const FrameHistory& history, std::int64_t frame);
+  void Begin(const FrameHistory& history, std::int64_t first);
   std::optional<ShotBorder> Judge(const FrameHistory& history) const;
 
   const std::int64_t second_;  // in frames

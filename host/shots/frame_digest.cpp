@@ -12,8 +12,9 @@ constexpr int kColumns = FrameDigest::kColumns, kRows = FrameDigest::kRows;
 // Pixels that are read of a cell. Of 32 the noise of a camera, some 5 of 255, leaves 1; a power of
 // two in all, so that a sum of lumas is a mean by a shift.
 constexpr int kAcross = 8, kDown = 4;
-// How far the cells of a bar lie from each other: what a coder leaves in black, in 255ths.
-constexpr int kBarRange = 3;
+// The cells of a bar are black, as far as a coder keeps that, and lie no further from each other
+// than this, in 255ths.
+constexpr int kBlack = 24, kBarRange = 3;
 
 using Cells = std::array<std::uint8_t, kColumns * kRows>;
 
@@ -53,7 +54,7 @@ Cells MeansOf(int width, int height, int unit, const RowOf& row_of, const LumaOf
   return cells;
 }
 
-// The frame without the lines along its four edges that are of one value, each edge's own.
+// The frame without the black lines along its four edges.
 FrameDigest::Area WithoutBars(const Cells& cells) {
   const auto at = [&](int x, int y) {
     return static_cast<int>(cells[static_cast<std::size_t>(y * kColumns + x)]);
@@ -63,13 +64,13 @@ FrameDigest::Area WithoutBars(const Cells& cells) {
     for (int x = 0; x < kColumns; ++x) {
       if (std::abs(at(x, y) - value) > kBarRange) return false;
     }
-    return true;
+    return value <= kBlack;
   };
   const auto column_is = [&](int x, int value) {
     for (int y = area.top; y < area.bottom; ++y) {
       if (std::abs(at(x, y) - value) > kBarRange) return false;
     }
-    return true;
+    return value <= kBlack;
   };
   while (area.top < kRows && row_is(area.top, at(0, 0))) ++area.top;
   while (area.bottom > area.top && row_is(area.bottom - 1, at(0, kRows - 1))) --area.bottom;
@@ -78,6 +79,12 @@ FrameDigest::Area WithoutBars(const Cells& cells) {
   while (area.right > area.left && column_is(area.right - 1, at(kColumns - 1, area.top))) {
     --area.right;
   }
+  // The cell that is half bar, and what the smoothing spreads.
+  constexpr int kEdge = 2;
+  if (area.top > 0) area.top += kEdge;
+  if (area.bottom < kRows) area.bottom -= kEdge;
+  if (area.left > 0) area.left += kEdge;
+  if (area.right < kColumns) area.right -= kEdge;
   return area.IsEmpty() ? FrameDigest::Area{} : area;
 }
 

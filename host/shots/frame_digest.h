@@ -45,7 +45,7 @@ struct FrameDigest {
   // a cell changes little. In `half` each cell is the mean of four.
   std::array<std::uint8_t, kColumns * kRows> cells;
   std::array<std::uint8_t, kHalfColumns * kHalfRows> half;
-  // Without the bars of a letterbox, which are of one value. Empty: all of the frame is of one.
+  // Without black bars along its edges. Empty: all of the frame is black.
   Area area;
 };
 

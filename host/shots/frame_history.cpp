@@ -6,7 +6,8 @@
 namespace calmframe::host {
 namespace {
 
-double ContrastOf(const FrameDigest& digest, const FrameDigest::Area& area) {
+double ContrastOf(const FrameDigest& digest) {
+  const FrameDigest::Area& area = digest.area;
   if (area.IsEmpty()) return 0;
   double sum = 0, squares = 0;
   for (int y = area.top; y < area.bottom; ++y) {
@@ -26,24 +27,35 @@ std::int64_t FrameHistory::first() const {
   return std::max<std::int64_t>(0, end_ - static_cast<std::int64_t>(entries_.size()));
 }
 
-void FrameHistory::Add(const FrameDigest& digest) {
-  Entry entry{digest, 0, {}, 0};
-  // A frame that fades has no content by which its bars can be told: those of the last frames hold.
+// What a frame takes for bars may be a dark thing that goes by, or a picture that fades: bars stay.
+FrameDigest::Area FrameHistory::SteadyArea(const FrameDigest::Area& last) const {
   constexpr std::int64_t kFrames = 32;
-  FrameDigest::Area area = digest.area;
+  std::vector<FrameDigest::Area> areas;
+  if (!last.IsEmpty()) areas.push_back(last);
   for (std::int64_t f = std::max(first(), end_ - kFrames); f < end_; ++f) {
-    const FrameDigest::Area& other = At(f).digest.area;
-    if (other.IsEmpty()) continue;
-    if (area.IsEmpty()) area = other;
-    area = {std::min(area.left, other.left), std::min(area.top, other.top),
-            std::max(area.right, other.right), std::max(area.bottom, other.bottom)};
+    if (!At(f).area.IsEmpty()) areas.push_back(At(f).area);
   }
-  entry.contrast = ContrastOf(digest, area);
+  if (areas.empty()) return {};
+  const auto median = [&](int FrameDigest::Area::*edge) {
+    const auto middle = areas.begin() + static_cast<std::ptrdiff_t>(areas.size() / 2);
+    std::nth_element(areas.begin(), middle, areas.end(),
+                     [edge](const auto& a, const auto& b) { return a.*edge < b.*edge; });
+    return *middle.*edge;
+  };
+  using Area = FrameDigest::Area;
+  const Area area{median(&Area::left), median(&Area::top), median(&Area::right),
+                  median(&Area::bottom)};
+  return area.IsEmpty() ? Area{} : area;
+}
+
+void FrameHistory::Add(const FrameDigest& digest) {
+  Entry entry{digest, digest.area, {}, {}, 0};
+  entry.digest.area = SteadyArea(digest.area);
+  entry.contrast = ContrastOf(entry.digest);
   if (end_ > 0) {
     const Entry& before = At(end_ - 1);
-    const DigestMatch match = MatchOf(before.digest, digest);
-    entry.difference = match.difference;
-    entry.place = before.place + match.shift;
+    entry.match = MatchOf(before.digest, entry.digest);
+    entry.place = before.place + entry.match.shift;
   }
   entries_[static_cast<std::size_t>(end_) % entries_.size()] = entry;
   ++end_;

@@ -21,13 +21,16 @@ class FrameHistory {
   bool Holds(std::int64_t frame) const { return first() <= frame && frame < end_; }
 
   const FrameDigest& digest(std::int64_t frame) const { return At(frame).digest; }
-  // To the frame before, see DigestMatch; 0 of the film's first and of frames that are not kept.
-  double difference(std::int64_t frame) const { return Holds(frame) ? At(frame).difference : 0; }
+  // From the frame before; nothing of the film's first and of frames that are not kept.
+  DigestMatch match(std::int64_t frame) const {
+    return Holds(frame) ? At(frame).match : DigestMatch{};
+  }
+  double difference(std::int64_t frame) const { return match(frame).difference; }
   // The motion of the picture, from match to match.
   CellShift Motion(std::int64_t from, std::int64_t to) const {
     return At(to).place - At(from).place;
   }
-  // Standard deviation and mean of the frame's luma, without the bars of the frames about it.
+  // Standard deviation of the frame's luma, in 255ths.
   double contrast(std::int64_t frame) const { return Holds(frame) ? At(frame).contrast : 0; }
   double Difference(std::int64_t a, std::int64_t b) const {
     return MatchOf(digest(a), digest(b)).difference;
@@ -35,11 +38,13 @@ class FrameHistory {
 
  private:
   struct Entry {
-    FrameDigest digest;
-    double difference = 0;
+    FrameDigest digest;      // with the area of the frames about it
+    FrameDigest::Area area;  // its own
+    DigestMatch match;
     CellShift place;  // the sum of the shifts so far
     double contrast = 0;
   };
+  FrameDigest::Area SteadyArea(const FrameDigest::Area& last) const;
   const Entry& At(std::int64_t frame) const {
     return entries_[static_cast<std::size_t>(frame) % entries_.size()];
   }

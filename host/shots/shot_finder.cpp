@@ -21,7 +21,9 @@ class ShotFinder::Search {
 
   void Add(const FrameDigest& digest) {
     history_.Add(digest);
-    Keep(fades_.Next(history_));
+    std::int64_t first = 0;
+    for (const ShotBorder& border : lately_) first = std::max(first, border.frame);
+    Keep(fades_.Next(history_, first));
     while (next_cut_ + kCutLag <= history_.end()) LookForCut();
     while (next_mixture_ + dissolves_.reach() + kCutLag < history_.end()) LookForMixture();
   }
