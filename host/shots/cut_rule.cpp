@@ -24,7 +24,7 @@ constexpr double kStill = 0.015, kCommonStill = 0.004;
 // alike parts differ above those about it, 3.2 at most where a title comes, 2.1 at most where one
 // comes that changes much.
 constexpr int kJump = 4;
-constexpr double kEverywhere = 3.5, kEverywhereOfMuch = 2.5, kMuch = 0.2;
+constexpr double kEverywhere = 3.2, kEverywhereOfMuch = 2.6, kMuch = 0.2;
 // But for the light the picture is the same, where a lamp goes on.
 constexpr double kLit = 0.5, kLitLeast = 0.15;
 // A flash is over after so many frames at most; the shortest shot is longer.

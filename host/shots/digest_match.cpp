@@ -128,8 +128,9 @@ constexpr int kBlockWidth = kColumns / kBlocksAcross, kBlockHeight = kRows / kBl
 constexpr int kBeside = 3;
 // Of the contrast's square: a block with more than that counts in full.
 constexpr double kFullContrast = 8 * kNoise;
-// The share of the blocks that DigestMatch::common is of.
-constexpr double kCommon = 0.35;
+// The share of the blocks that DigestMatch::common is of, and what counts in full there: sky and road
+// are alike in two views of a place.
+constexpr double kCommon = 0.35, kRichContrast = 256;
 
 Moments BlockMoments(const FrameDigest& a, const FrameDigest& b, const Area& in_a, CellShift by) {
   std::int32_t n = in_a.size(), sa = 0, sb = 0, aa = 0, bb = 0, ab = 0;
@@ -192,7 +193,7 @@ DigestMatch BlocksAbout(const FrameDigest& first, const FrameDigest& second, con
   const double gain = GainOf(first, second, area, shift);
 
   struct BlockMatch {
-    double least = 2, weight = 0;
+    double least = 2, contrast = 0;  // the contrast's square
   };
   std::array<BlockMatch, kBlocks> blocks;
   DigestMatch match;
@@ -209,8 +210,7 @@ DigestMatch BlocksAbout(const FrameDigest& first, const FrameDigest& second, con
         const double residual = std::max(0.0, a + b - 2 * gain * m.cov());
         BlockMatch& block = blocks[static_cast<std::size_t>(k)];
         block.least = std::min(block.least, std::min(1.0, residual / (a + b + 2 * kNoise)));
-        block.weight =
-            std::max(block.weight, std::min(1.0, std::max(m.var_a(), b) / kFullContrast));
+        block.contrast = std::max({block.contrast, m.var_a(), b});
         residuals += residual;
         contrasts += a + b;
       }
@@ -222,10 +222,12 @@ DigestMatch BlocksAbout(const FrameDigest& first, const FrameDigest& second, con
   }
   const auto end = std::remove_if(blocks.begin(), blocks.end(),
                                   [](const BlockMatch& block) { return block.least > 1; });
-  double sum = 0, weights = 0;
+  double sum = 0, weights = 0, rich = 0;
   for (auto block = blocks.begin(); block != end; ++block) {
-    sum += block->weight * block->least;
-    weights += block->weight;
+    const double weight = std::min(1.0, block->contrast / kFullContrast);
+    sum += weight * block->least;
+    weights += weight;
+    rich += std::min(1.0, block->contrast / kRichContrast);
   }
   if (!(weights > 0)) return match;
   // A tenth of full weight for each block that says nothing.
@@ -233,8 +235,8 @@ DigestMatch BlocksAbout(const FrameDigest& first, const FrameDigest& second, con
   std::sort(blocks.begin(), end,
             [](const BlockMatch& a, const BlockMatch& b) { return a.least < b.least; });
   double alike = 0;
-  for (auto block = blocks.begin(); block != end && alike < kCommon * weights; ++block) {
-    alike += block->weight;
+  for (auto block = blocks.begin(); block != end && alike < kCommon * rich; ++block) {
+    alike += std::min(1.0, block->contrast / kRichContrast);
     match.common = block->least;
   }
   return match;

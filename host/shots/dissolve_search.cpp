@@ -23,9 +23,10 @@ constexpr double kSum[2] = {0.7, 1.3};
 constexpr double kShare[2] = {0.25, 0.75};
 // By how much it grows over each half of the way, at least; a third to a half it should be.
 constexpr double kGrowth = 0.08;
-// Strength: see HitAt. Outside of dissolves 0.24 at most, over a pan across a repeated pattern;
-// 0.3 to 2 in all dissolves between different places.
-constexpr double kStrong = 0.3;
+// Strength, see HitAt: the sum over a dissolve's frames times the greatest. Outside of dissolves 0.16
+// at most, over a pan across a repeated pattern; less in two of 24 dissolves between similar places, in
+// none between others.
+constexpr double kStrong = 0.18;
 constexpr double kWeak = 0.06;  // is still a part of a dissolve
 
 // Of what either frame alone leaves: so much can be seen well.
@@ -167,8 +168,11 @@ std::optional<ShotBorder> DissolveSearch::BorderOf(const FrameHistory& history) 
   const Hit best = *std::max_element(hits_.begin(), hits_.end(), [](const Hit& a, const Hit& b) {
     return a.strength < b.strength;
   });
+  double sum = 0;
+  for (const Hit& hit : hits_) sum += hit.strength;
+  const double margin = sum * best.strength / kStrong;
   // Three frames in a row are no accident, but of the shortest dissolves there are no more.
-  if (best.strength < kStrong || (hits_.size() < 3 && best.width > 2 * step_)) return {};
+  if (margin < 1 || (hits_.size() < 3 && best.width > 2 * step_)) return {};
 
   std::int64_t first_sure = best.frame, last_sure = best.frame;
   for (const Hit& hit : hits_) {
@@ -199,7 +203,7 @@ std::optional<ShotBorder> DissolveSearch::BorderOf(const FrameHistory& history) 
   border.first = first + span.before * step_ + 1;
   border.last = first + span.behind * step_ - 1;
   border.frame = (border.first + border.last + 1) / 2;
-  border.confidence = 1 - 0.5 * kStrong / best.strength;
+  border.confidence = 1 - 0.5 / margin;
   return border;
 }
 
