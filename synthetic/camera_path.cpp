@@ -103,6 +103,22 @@ camera_path handheld_path(const handheld_path_options& options) {
   return {shaken, intended};
 }
 
+camera_path with_whip_pans(const camera_path& path, const std::vector<int>& starts, double frames,
+                           double angle) {
+  const auto turned = [starts, frames, angle](const std::function<camera_pose(double)>& pose_at) {
+    return [=](double t) {
+      camera_pose pose = pose_at(t);
+      for (const int start : starts) {
+        const double u = std::clamp((t - start) / frames, 0.0, 1.0);
+        // Rotation maps the world to the camera, so it is against the camera's turn.
+        pose.rotation[1] -= angle * u * u * (3 - 2 * u);
+      }
+      return pose;
+    };
+  };
+  return {turned(path.shaken), turned(path.intended)};
+}
+
 camera_path resting_path(const camera_pose& pose) {
   const auto rest = [pose](double) { return pose; };
   return {rest, rest};

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <vector>
 
 #include "synthetic/camera.h"
 
@@ -41,6 +42,11 @@ struct handheld_path_options {
 // The shake is band-limited, 0.8 to 9 Hz with a 1/f amplitude: most of its power at the pace of
 // steps, a little tremor on top.
 camera_path handheld_path(const handheld_path_options& options);
+
+// The path with quick turns to the right: from each of `starts` on, in frames, within `frames` and
+// by `angle` radians, slowly at its start and end (the cubic 3 u^2 - 2 u^3).
+camera_path with_whip_pans(const camera_path& path, const std::vector<int>& starts, double frames,
+                           double angle);
 
 // No motion at all, at the given pose.
 camera_path resting_path(const camera_pose& pose);

@@ -1,0 +1,118 @@
+#include "host/shots/fade_watch.h"
+
+#include <algorithm>
+#include <cmath>
+
+#include "host/shots/cut_rule.h"
+
+namespace calmframe::host {
+namespace {
+
+// Of the picture's contrast: below it is low, four times the least it is low no more. A fade in
+// which no frame is plain has a sixth at least where either half takes five frames or more.
+constexpr double kLow = 0.25;
+// What is called the picture itself, of the most contrast that it had lately.
+constexpr double kWhole = 0.8;
+// Frames in which the picture can be seen, and is seen to fade.
+constexpr double kFaint[2] = {0.3, 0.75};
+// Differences, see DigestMatch: of a picture to itself, faint; of two pictures.
+constexpr double kItself = 0.25, kOther = 0.12;
+
+// Whether the frames from a picture to a plain one, `count` away and behind it or before it, show
+// it fainter at first, where any are between: whoever pans over a wall has a plain picture too.
+bool FadesFrom(const FrameHistory& history, std::int64_t picture, std::int64_t count) {
+  const std::int64_t step = count < 0 ? -1 : 1;
+  for (std::int64_t f = picture + step; f != picture + count; f += step) {
+    if (!history.Holds(f)) break;
+    const double part = history.contrast(f) / history.contrast(picture);
+    if (part > kFaint[0] && part < kFaint[1]) return history.Difference(picture, f) < kItself;
+  }
+  return true;
+}
+
+}  // namespace
+
+FadeWatch::FadeWatch(double frames_per_second)
+    : second_(std::clamp<std::int64_t>(std::llround(frames_per_second), 10, 240)) {}
+
+void FadeWatch::Begin(const FrameHistory& history, std::int64_t first) {
+  const std::int64_t frame = history.end() - 1;
+  double most = 0;
+  for (std::int64_t f = std::max({first, history.first(), frame - second_}); f < frame; ++f) {
+    most = std::max(most, history.contrast(f));
+  }
+  if (!(most > 2 * kPlain && history.contrast(frame) < kLow * most)) return;
+  state_ = State::low;
+  least_ = 1e30;
+  before_frame_ = frame - 1;
+  while (history.contrast(before_frame_) < kWhole * most) --before_frame_;
+  before_ = history.digest(before_frame_);
+  before_contrast_ = history.contrast(before_frame_);
+  before_fades_ = FadesFrom(history, before_frame_, frame - before_frame_);
+}
+
+std::optional<ShotBorder> FadeWatch::Next(const FrameHistory& history, std::int64_t first) {
+  const std::int64_t frame = history.end() - 1;
+  const double contrast = history.contrast(frame);
+  std::optional<ShotBorder> border;
+  if (state_ == State::rising && frame - rise_ >= second_ / 2) {
+    border = Judge(history);
+    state_ = State::clear;
+  }
+  if (state_ == State::rising && contrast < kLow * before_contrast_ && contrast < kPlain) {
+    // Down again.
+    border = Judge(history);
+    state_ = State::clear;
+  }
+  // There was a cut to a picture of less contrast.
+  if (state_ != State::clear && first > before_frame_) state_ = State::clear;
+  if (state_ == State::clear) Begin(history, first);
+  if (state_ != State::low) return border;
+
+  if (contrast < least_) least_ = contrast;
+  const double plain = std::max(kPlain, 1.2 * least_);
+  if (contrast <= plain) {
+    if (plain_last_ < before_frame_ || history.contrast(plain_last_) > plain) plain_first_ = frame;
+    plain_last_ = frame;
+  }
+  if (contrast > std::max(kPlain, least_) / kLow) {
+    state_ = State::rising;
+    rise_ = frame;
+  } else if (contrast > kPlain && frame - plain_last_ > second_) {
+    state_ = State::clear;  // another picture, of little contrast
+  }
+  return border;
+}
+
+std::optional<ShotBorder> FadeWatch::Finish(const FrameHistory& history) {
+  std::optional<ShotBorder> border;
+  if (state_ == State::rising) border = Judge(history);
+  state_ = State::clear;
+  return border;
+}
+
+std::optional<ShotBorder> FadeWatch::Judge(const FrameHistory& history) const {
+  // The picture that comes: the first of the most contrast.
+  double most = 0;
+  const std::int64_t end = std::min(history.end(), rise_ + second_ / 2);
+  for (std::int64_t f = rise_; f < end; ++f) most = std::max(most, history.contrast(f));
+  if (!(least_ < kLow * std::min(before_contrast_, most)) || !before_fades_) return {};
+  std::int64_t behind = rise_;
+  while (history.contrast(behind) < kWhole * most) ++behind;
+  if (!FadesFrom(history, behind, plain_last_ - behind)) return {};
+  // The same picture goes on behind a flash or a frame that was lost.
+  const bool short_one = plain_last_ - plain_first_ < second_ / 4;
+  const double difference = MatchOf(before_, history.digest(behind)).difference;
+  if (short_one && difference < kOther) return {};
+  ShotBorder border;
+  border.kind = ShotBorder::Kind::fade;
+  border.first = before_frame_ + 1;
+  border.last = std::max(border.first, behind - 1);
+  border.frame = (plain_first_ + plain_last_ + 1) / 2;
+  border.confidence =
+      1 - 0.5 * std::min(1.0, std::max(least_ / (kLow * std::min(before_contrast_, most)),
+                                       short_one ? kOther / difference : 0.0));
+  return border;
+}
+
+}  // namespace calmframe::host

@@ -1,0 +1,161 @@
+#include "host/shots/frame_digest.h"
+
+#include <algorithm>
+#include <cassert>
+
+#include "host/timeline/picture.h"
+
+namespace calmframe::host {
+namespace {
+
+constexpr int kColumns = FrameDigest::kColumns, kRows = FrameDigest::kRows;
+// Pixels that are read of a cell. Of 32 the noise of a camera, some 5 of 255, leaves 1; a power of
+// two in all, so that a sum of lumas is a mean by a shift.
+constexpr int kAcross = 8, kDown = 4;
+// The cells of a bar are black, as far as a coder keeps that, and lie no further from each other
+// than this, in 255ths.
+constexpr int kBlack = 24, kBarRange = 3;
+
+using Cells = std::array<std::uint8_t, kColumns * kRows>;
+
+// Where the samples of an axis lie: in the middles of `count` even parts.
+template <std::size_t count>
+std::array<int, count> Places(int size) {
+  std::array<int, count> places;
+  for (std::size_t i = 0; i < count; ++i) {
+    places[i] = static_cast<int>((2 * i + 1) * static_cast<std::size_t>(size) / (2 * count));
+  }
+  return places;
+}
+
+// luma_of(row, x): 0 to 255, times `unit`; `row` from row_of(y).
+template <class RowOf, class LumaOf>
+Cells MeansOf(int width, int height, int unit, const RowOf& row_of, const LumaOf& luma_of) {
+  const auto columns = Places<static_cast<std::size_t>(kColumns * kAcross)>(width);
+  const auto rows = Places<static_cast<std::size_t>(kRows * kDown)>(height);
+  const int whole = unit * kAcross * kDown;
+  Cells cells;
+  for (int y = 0; y < kRows; ++y) {
+    std::array<std::int32_t, kColumns> sums{};
+    for (int j = 0; j < kDown; ++j) {
+      const auto* const row = row_of(rows[static_cast<std::size_t>(y * kDown + j)]);
+      for (std::size_t x = 0; x < sums.size(); ++x) {
+        std::int32_t sum = 0;
+        for (std::size_t i = 0; i < kAcross; ++i) sum += luma_of(row, columns[x * kAcross + i]);
+        sums[x] += sum;
+      }
+    }
+    for (std::size_t x = 0; x < sums.size(); ++x) {
+      const int mean = (sums[x] + whole / 2) / whole;
+      cells[static_cast<std::size_t>(y * kColumns) + x] =
+          static_cast<std::uint8_t>(std::clamp(mean, 0, 255));
+    }
+  }
+  return cells;
+}
+
+// The frame without the black lines along its four edges.
+FrameDigest::Area WithoutBars(const Cells& cells) {
+  const auto at = [&](int x, int y) {
+    return static_cast<int>(cells[static_cast<std::size_t>(y * kColumns + x)]);
+  };
+  FrameDigest::Area area{0, 0, kColumns, kRows};
+  const auto row_is = [&](int y, int value) {
+    for (int x = 0; x < kColumns; ++x) {
+      if (std::abs(at(x, y) - value) > kBarRange) return false;
+    }
+    return value <= kBlack;
+  };
+  const auto column_is = [&](int x, int value) {
+    for (int y = area.top; y < area.bottom; ++y) {
+      if (std::abs(at(x, y) - value) > kBarRange) return false;
+    }
+    return value <= kBlack;
+  };
+  while (area.top < kRows && row_is(area.top, at(0, 0))) ++area.top;
+  while (area.bottom > area.top && row_is(area.bottom - 1, at(0, kRows - 1))) --area.bottom;
+  if (area.IsEmpty()) return {};
+  while (area.left < kColumns && column_is(area.left, at(0, area.top))) ++area.left;
+  while (area.right > area.left && column_is(area.right - 1, at(kColumns - 1, area.top))) {
+    --area.right;
+  }
+  // The cell that is half bar, and what the smoothing spreads.
+  constexpr int kEdge = 2;
+  if (area.top > 0) area.top += kEdge;
+  if (area.bottom < kRows) area.bottom -= kEdge;
+  if (area.left > 0) area.left += kEdge;
+  if (area.right < kColumns) area.right -= kEdge;
+  return area.IsEmpty() ? FrameDigest::Area{} : area;
+}
+
+// Weights 1, 2, 1 across and down; the edge's cells are repeated.
+Cells Smoothed(const Cells& cells) {
+  std::array<int, kColumns * kRows> across;
+  for (int y = 0; y < kRows; ++y) {
+    const std::uint8_t* const row = cells.data() + y * kColumns;
+    int* const out = across.data() + y * kColumns;
+    for (int x = 0; x < kColumns; ++x) {
+      out[x] = row[std::max(x - 1, 0)] + 2 * row[x] + row[std::min(x + 1, kColumns - 1)];
+    }
+  }
+  Cells smooth;
+  for (int y = 0; y < kRows; ++y) {
+    const int* const above = across.data() + std::max(y - 1, 0) * kColumns;
+    const int* const here = across.data() + y * kColumns;
+    const int* const below = across.data() + std::min(y + 1, kRows - 1) * kColumns;
+    for (int x = 0; x < kColumns; ++x) {
+      smooth[static_cast<std::size_t>(y * kColumns + x)] =
+          static_cast<std::uint8_t>((above[x] + 2 * here[x] + below[x] + 8) >> 4);
+    }
+  }
+  return smooth;
+}
+
+FrameDigest DigestOfCells(const Cells& cells) {
+  FrameDigest digest;
+  digest.area = WithoutBars(cells);
+  digest.cells = Smoothed(cells);
+  for (int y = 0; y < FrameDigest::kHalfRows; ++y) {
+    const std::uint8_t* const row = digest.cells.data() + 2 * y * kColumns;
+    std::uint8_t* const out = digest.half.data() + y * FrameDigest::kHalfColumns;
+    for (int x = 0; x < FrameDigest::kHalfColumns; ++x) {
+      const int sum =
+          row[2 * x] + row[2 * x + 1] + row[kColumns + 2 * x] + row[kColumns + 2 * x + 1];
+      out[x] = static_cast<std::uint8_t>((sum + 2) >> 2);
+    }
+  }
+  return digest;
+}
+
+}  // namespace
+
+ArgbView ViewOf(const Picture& picture) {
+  assert(picture.kind() == PixelKind::argb8);
+  return {picture.row<HX_Pixel8>(0),
+          picture.top_down() ? picture.row_bytes() : -picture.row_bytes(), picture.width(),
+          picture.height()};
+}
+
+FrameDigest DigestOf(const ArgbView& frame) {
+  // 256ths of .299, .587 and .114.
+  constexpr int kRed = 77, kGreen = 150, kBlue = 29;
+  const auto* const top = reinterpret_cast<const std::uint8_t*>(frame.top_row);
+  return DigestOfCells(MeansOf(
+      frame.width, frame.height, kRed + kGreen + kBlue,
+      [&](int y) { return reinterpret_cast<const HX_Pixel8*>(top + y * frame.row_bytes); },
+      [](const HX_Pixel8* row, int x) {
+        return kRed * row[x].red + kGreen * row[x].green + kBlue * row[x].blue;
+      }));
+}
+
+FrameDigest DigestOf(const LumaView& frame) {
+  // Limited range: 219 steps from black to white, so a step is 255 of 219.
+  const int black = frame.limited_range ? 16 : 0;
+  const int step = frame.limited_range ? 255 : 1;
+  return DigestOfCells(MeansOf(
+      frame.width, frame.height, frame.limited_range ? 219 : 1,
+      [&](int y) { return frame.top_row + y * frame.row_bytes; },
+      [=](const std::uint8_t* row, int x) { return step * (row[x] - black); }));
+}
+
+}  // namespace calmframe::host
