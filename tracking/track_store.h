@@ -62,6 +62,11 @@ std::vector<Trajectory> BuildTrajectories(const Cell* cells, std::size_t feature
 // correlation stay. 0 is off.
 void RemoveShortTracks(AllFeatures& all_features, std::int32_t kill_tracks_shorter_than);
 
+// The table of a run that had ended before row `rows`: a copy of its first rows, of which short
+// tracks are removed again, since more of them end early. One that has no more rows stays.
+void ShortenTable(AllFeatures& all_features, std::int64_t rows,
+                  std::int32_t kill_tracks_shorter_than);
+
 // ---- implementation ----
 
 template <class Cell>

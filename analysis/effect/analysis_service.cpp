@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <string>
 
 #include "analysis/effect/analysis_effect.h"
@@ -30,6 +31,18 @@ void EndJob(const kelp::effect::HostContext& context, Analyzer& analyzer,
             const std::string& text = {}) {
   analyzer.Cancel(context.in, context.out, text.c_str());
   analyzer.Stop(context.in, context.out);
+}
+
+// Tells the job where the host sees the clip's shot end by now; nothing where it sees to no shots.
+void TellEnd(const kelp::effect::HostContext& context, Analyzer& analyzer) try {
+  const ScopedSuite<HX_AnalysisSpanSuite1> suite(context);
+  std::int32_t end = 0;
+  ThrowIfFailed(suite->GetEnd(context.in->effect_ref, &end));
+  const JobInput& input = analyzer.record().job_input_parameters;
+  const std::int64_t rows_a_frame = CountsFields(input) ? 2 : 1;
+  analyzer.EndBefore(std::max<std::int64_t>(end - analyzer.FirstFrame(), 1) * rows_a_frame);
+} catch (std::int32_t) {
+  kelp::effect::ClearMessage(context);
 }
 
 // Throws HX_ERR_LAYER_REFUSED, with a message, for a layer that shows nothing.
@@ -179,6 +192,7 @@ void AnalysisEffect::PollAnalysis(AnalysisState& state) {
     BeginPolledAnalysis(state);
     return;
   }
+  TellEnd(context(), *analyzer);
   const JobState job = analyzer->GetStatus().state;
   if (job == JobState::Running && analyzer->job_stage() != JobStage::SeenRunning) {
     analyzer->set_job_stage(JobStage::SeenRunning);

@@ -37,7 +37,11 @@ void Analysis::Track(Job& job) {
   // Short tracks go after the dump, which shows every track.
   marrow::tracking::TrackerParams keep_all = tracker_;
   keep_all.kill_tracks_shorter_than = 0;
-  TrackFrames(source, selector_, keep_all, all_features_);
+  try {
+    TrackFrames(source, selector_, keep_all, all_features_);
+  } catch (const EndOfRun&) {  // the rows before it are whole
+  }
+  ShortenTable(all_features_, job.end_row(), 0);
   WriteAnalysisServerTrackFile(all_features_);
   RemoveShortTracks(all_features_, tracker_.kill_tracks_shorter_than);
   source.ReleaseFrames();

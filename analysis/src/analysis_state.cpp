@@ -2,6 +2,7 @@
 
 #include <boost/make_shared.hpp>
 
+#include "analysis/src/job_frame_source.h"
 #include "platform/tessel/utility.h"
 
 namespace kelp::analysis {
@@ -42,6 +43,10 @@ bool AnalysisState::TakeResults() {
     next.all_features = *features;
     next.all_features.first_frame = static_cast<std::int32_t>(analyzer->FirstRunFrame());
     next.job_input = analyzer->record().job_input_parameters;
+    const std::int64_t rows = features->frame_count;
+    if (rows < GetRunFrames(next.job_input).frame_count) {  // it ended early
+      next.job_input.Duration = RowDuration(next.job_input) * rows;
+    }
     next.tracker_identity = analyzer->GetTrackerGuid();
   });
   source_changed = false;

@@ -36,8 +36,8 @@ class AnalysisState {
   void DropAnalyzer();
   // Cancels and stops the analyzer, if any, and drops it.
   void EndAnalyzer(HX_InData* host_in, HX_OutData* host_out);
-  // Takes over the results of the analyzer's job and what they were made from. False, and nothing
-  // changes, if there are none.
+  // Takes over the results of the analyzer's job and what they were made from, which is a shorter
+  // span of the clip where the job ended early. False, and nothing changes, if there are none.
   bool TakeResults();
 
   const marrow::tracking::AllFeatures& table() const { return result->all_features; }

@@ -25,6 +25,11 @@ void LogFields(const char* record, const Params& params) {
   });
 }
 
+// Its table is not of all that its input tells.
+bool EndedEarly(const Job& job) {
+  return job.end_row() < GetRunFrames(job.input()).frame_count;
+}
+
 // The table of a running job will do, since the effect learns from the identity what it was made
 // with; a finished one that does not fit would only be made again.
 bool MayJoin(const JobRegistry::Entry& entry, const tessel::utility::Guid& tracker_guid) {
@@ -33,7 +38,8 @@ bool MayJoin(const JobRegistry::Entry& entry, const tessel::utility::Guid& track
     case JobState::Running:
       return true;
     case JobState::Finished:
-      return !entry.job->WasCancelled() && entry.analysis->tracker_identity() == tracker_guid;
+      return !entry.job->WasCancelled() && !EndedEarly(*entry.job) &&
+             entry.analysis->tracker_identity() == tracker_guid;
     default:
       return false;
   }
@@ -67,6 +73,8 @@ void Analyzer::Start(HX_InData*, HX_OutData*) {
 void Analyzer::Stop(HX_InData*, HX_OutData*) {
   record_.job_stage = JobStage::NotStarted;
 }
+
+void Analyzer::EndBefore(std::int64_t) {}
 
 std::int64_t Analyzer::FirstFrame() const {
   const JobInput& input = record_.job_input_parameters;
@@ -190,7 +198,15 @@ std::string AnalyzerPrem::GetErrorText() {
 boost::shared_ptr<marrow::tracking::AllFeatures> AnalyzerPrem::GetFeatures() {
   const JobRegistry::Entry entry = FindEntry();
   if (!HasResults(entry)) return {};
-  return boost::make_shared<marrow::tracking::AllFeatures>(entry.analysis->all_features());
+  const auto features =
+      boost::make_shared<marrow::tracking::AllFeatures>(entry.analysis->all_features());
+  ShortenTable(*features, entry.job->end_row(), record_.tracker_params.kill_tracks_shorter_than);
+  return features;
+}
+
+void AnalyzerPrem::EndBefore(std::int64_t row) {
+  const JobRegistry::Entry entry = FindEntry();
+  if (entry.job) entry.job->EndBefore(row);
 }
 
 bool AnalyzerPrem::CanGoOn() {

@@ -57,6 +57,9 @@ class Analyzer {
   // Whether an analyzer that was read from a project still has something to wait for: it has not
   // started, or its job runs or has results in this process.
   virtual bool CanGoOn() = 0;
+  // The job, if there is one, ends before this row of its run (Job::EndBefore), and its table does
+  // where the job had done more.
+  virtual void EndBefore(std::int64_t row);
 
   // Frames of the clip, of one StepTime each; the end excluded.
   std::int64_t FirstFrame() const;
@@ -104,6 +107,7 @@ class AnalyzerPrem final : public Analyzer {
   std::string GetErrorText() override;
   boost::shared_ptr<marrow::tracking::AllFeatures> GetFeatures() override;
   bool CanGoOn() override;
+  void EndBefore(std::int64_t row) override;
 
  private:
   JobRegistry::Key key() const { return {record_.job_guid, source_identity_}; }

@@ -80,6 +80,12 @@ void Job::Cancel() {
   });
 }
 
+void Job::EndBefore(std::int64_t row) {
+  std::int64_t present = end_row_;
+  while (row < present && !end_row_.compare_exchange_weak(present, row)) {
+  }
+}
+
 void Job::SetFailed(const char* literal) {
   ChangeStatus([&] {
     if (status_.state >= JobState::Failed) return false;

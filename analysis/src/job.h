@@ -1,9 +1,11 @@
 #pragma once
 
+#include <atomic>
 #include <boost/function.hpp>
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <exception>
+#include <limits>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -14,6 +16,9 @@ namespace kelp::analysis {
 
 // Ends a run whose job is no longer wanted; thrown by a frame fetch, swallowed by the run.
 class TerminateException : public std::exception {};
+
+// Ends a run whose job was told to end before the row that is fetched.
+class EndOfRun : public std::exception {};
 
 // From Ready to Running on the job's thread as its body begins; to Cancelled from either, by
 // whoever cancels; to Failed from any of these, where something fails; to Finished on the job's
@@ -69,6 +74,11 @@ class Job {
 
   // The body stops at its next fetch. Without effect once the job has failed or finished.
   void Cancel();
+  // The body ends before this row of its run, as if there were no more; rows that it has done
+  // already are dropped. A later call can only lower it.
+  void EndBefore(std::int64_t row);
+  // That row; the greatest number where none was told.
+  std::int64_t end_row() const { return end_row_; }
   // The job fails with this localisation literal, the first one if there are several; throws.
   [[noreturn]] void Fail(const char* literal);
 
@@ -90,6 +100,7 @@ class Job {
 
   const tessel::utility::Guid id_;
   const JobInput input_;
+  std::atomic<std::int64_t> end_row_ = std::numeric_limits<std::int64_t>::max();
   mutable std::recursive_mutex status_lock_;
   JobStatus status_;                // guarded by status_lock_
   const char* error_literal_ = "";  // guarded by status_lock_; needs no memory

@@ -52,6 +52,7 @@ template <class Convert>
 void JobFrameSource::Load(Reader& reader, std::size_t frame_index, const Convert& convert) {
   if (job_.GetStatus().state >= JobState::Cancelled) throw TerminateException();
   const auto frame = static_cast<std::int64_t>(frame_index);
+  if (frame >= job_.end_row()) throw EndOfRun();
   const RationalTime time = TimeOf(frame);
   if (reader.last_frame != frame) Release(reader);
 

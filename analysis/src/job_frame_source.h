@@ -20,7 +20,8 @@ RunFrames GetRunFrames(const JobInput& input);
 
 // The frames of a job as the tracker wants them. Colour, luma and mask are fetched apart, each one
 // frame ahead; the host renders a frame that several ask for once. Throws TerminateException from
-// the first fetch after the job has left Running.
+// the first fetch after the job has left Running, and
+// EndOfRun from a fetch at or behind the job's end row.
 class JobFrameSource final : public marrow::tracking::FrameSource {
  public:
   // The job outlives it. Orders the first two frames.

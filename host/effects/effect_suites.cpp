@@ -244,6 +244,18 @@ constexpr HX_AnalysisHostSuite1 kAnalysisHost = {
     ScheduleAnalysis, GetRefusal};
 constexpr HX_StabilizerHostSuite7 kStabilizerHost = {SetFramePolygon};
 
+// -- Analysis Span --
+
+HX_Err GetEnd(HX_EffectRef effect, std::int32_t* frame) {
+  return Tell("Analysis Span.GetEnd", effect, frame, [](TimelineEffect&, const LayerState& layer) {
+    constexpr std::int64_t kMost = std::numeric_limits<std::int32_t>::max();
+    return static_cast<std::int32_t>(
+        std::min(layer.source->EndOfShot(layer.start_frame), kMost));
+  });
+}
+
+constexpr HX_AnalysisSpanSuite1 kAnalysisSpan = {GetEnd};
+
 // -- Opaque Effect Data --
 
 HX_Err FindOpaque(std::uint64_t reference, void** block) {
@@ -282,6 +294,7 @@ const void* FindEffectSuite(std::string_view name, std::int32_t version) {
       {{HX_WORLD_SUITE, HX_WORLD_SUITE_VERSION}, &kWorld},
       {{HX_BLUR_SUITE, HX_BLUR_SUITE_VERSION}, &kBlur},
       {{HX_ANALYSIS_HOST_SUITE, HX_ANALYSIS_HOST_SUITE_VERSION}, &kAnalysisHost},
+      {{HX_ANALYSIS_SPAN_SUITE, HX_ANALYSIS_SPAN_SUITE_VERSION}, &kAnalysisSpan},
       {{HX_STABILIZER_HOST_SUITE, HX_STABILIZER_HOST_SUITE_VERSION}, &kStabilizerHost},
       {{HX_OPAQUE_EFFECT_DATA_SUITE, HX_OPAQUE_EFFECT_DATA_SUITE_VERSION}, &kOpaqueEffectData}};
   const auto found = suites.find({name, version});

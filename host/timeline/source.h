@@ -3,6 +3,7 @@
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
 #include <functional>
+#include <limits>
 #include <memory>
 #include <string>
 
@@ -37,6 +38,11 @@ class Source {
   // cheapest, also from several threads. Throws std::runtime_error, one line that names the file
   // and the cause.
   virtual PicturePtr Fetch(std::int64_t frame, PixelKind kind) = 0;
+
+  // Where the shot that holds the frame ends, as far as is known from what was fetched: the first
+  // frame of the next, or kNoEnd. Never grows.
+  virtual std::int64_t EndOfShot(std::int64_t /*frame*/) const { return kNoEnd; }
+  static constexpr std::int64_t kNoEnd = std::numeric_limits<std::int64_t>::max();
 };
 
 using SourcePtr = boost::shared_ptr<Source>;

@@ -104,6 +104,16 @@ typedef struct HX_AnalysisHostSuite1 {
   HX_Err (*GetRefusal)(HX_EffectRef effect, uint16_t* text, uint32_t max);
 } HX_AnalysisHostSuite1;
 
+#define HX_ANALYSIS_SPAN_SUITE "Analysis Span Suite"
+#define HX_ANALYSIS_SPAN_SUITE_VERSION 1
+/* Offered by hosts that learn of a clip's shots while it is analysed. */
+typedef struct HX_AnalysisSpanSuite1 {
+  /* UI. Source frame before which an analysis that runs ends, as if the layer did; what it has of
+     later frames is dropped. Never grows while it runs. A layer that is shown to its end: any frame
+     behind that. */
+  HX_Err (*GetEnd)(HX_EffectRef effect, int32_t* frame);
+} HX_AnalysisSpanSuite1;
+
 #define HX_STABILIZER_HOST_SUITE "Stabilizer Host Suite"
 #define HX_STABILIZER_HOST_SUITE_VERSION 7
 typedef struct HX_StabilizerHostSuite7 {

@@ -43,9 +43,7 @@ BlasCall::BlasCall() {
   const int now = ++under_way;
   int before = had;
   if (now <= before) return;
-  // Volatile: a compiler may leave out memory that is only taken and given back, and take it for
-  // had.
-  void* volatile buffer = std::malloc(kBufferBytes);
+  void* const buffer = std::malloc(kBufferBytes);
   std::free(buffer);
   if (!buffer) {
     --under_way;

@@ -71,11 +71,12 @@ TEST_F(OutsideRenderer, ReadsWhileTheUserInterfaceSolves) {
   Effect& effect = Steady({96, 64, kFrames, "read meanwhile", 0.3});
   const void* const block = effect.opaque_data();
   std::atomic<bool> end{false};
-  std::atomic<int> allowed{0};
+  std::atomic<int> allowed{0}, rounds{0};
   std::vector<std::jthread> readers;
-  for (int i = 0; i < 3; ++i) {
+  constexpr int kReaders = 3;
+  for (int i = 0; i < kReaders; ++i) {
     readers.emplace_back([&, i] {
-      for (std::int32_t frame = i; !end; frame = (frame + 1) % kFrames) {
+      for (std::int32_t frame = i; !end; frame = (frame + 1) % kFrames, ++rounds) {
         allowed += exports().allow_cuda_rendering(block);
         float rect[4] = {-1, -1, -1, -1};
         const auto n = DataOf(block);
@@ -102,6 +103,9 @@ TEST_F(OutsideRenderer, ReadsWhileTheUserInterfaceSolves) {
     effect.SetParam(change % 2 ? kMaximumScale : kSmoothness, 110 + change);
     EXPECT_EQ(Settle(effect), 8);
   }
+  // Until one has read all of it at rest, when what is solved fits the controls.
+  const int at_rest = rounds;
+  while (rounds <= at_rest + kReaders) std::this_thread::yield();
   end = true;
   readers.clear();
   EXPECT_GT(allowed, 0);

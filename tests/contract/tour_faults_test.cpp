@@ -66,7 +66,7 @@ TEST_F(TourFaults, AFailingOperationIsSurvivedWhicheverItIs) {
       if (HasFailure()) return;
     }
   }
-  EXPECT_EQ(suites, 14);
+  EXPECT_EQ(suites, 15);
 }
 
 }  // namespace

@@ -49,7 +49,7 @@ class TourSaved : public PlayedPlugin {
     Project project;
     project.clip_path = "none";
     project.ticks_per_frame = 1;
-    project.effect = saved;
+    project.shots.front().effect = saved;
     SaveProject(folder_.In("saved"), project);
     const std::string self = std::filesystem::read_symlink("/proc/self/exe");
     const std::string command =
@@ -64,7 +64,7 @@ class TourSaved : public PlayedPlugin {
 };
 
 TEST_F(TourSaved, DISABLED_InAnotherProcess) {
-  const SavedEffect saved = LoadProject("saved").effect;
+  const SavedEffect saved = LoadProject("saved").shots.front().effect;
   Effect& effect = session().Load(MakeLayer(kClip), saved);
   if (const std::string smoothness = std::getenv("CALMFRAME_SMOOTHNESS"); !smoothness.empty()) {
     effect.SetParam(kSmoothness, std::stod(smoothness));

@@ -42,6 +42,7 @@ TEST_F(HostAccessTest, EverySuiteIsThereAndMayBeRefused) {
       {Ask<HX_AdvAppSuite1>, "HX OV Adv App Suite 1"},
       {Ask<HX_WorldSuite2>, "HX World Suite 2"},
       {Ask<HX_AnalysisHostSuite1>, "Analysis Host Suite 1"},
+      {Ask<HX_AnalysisSpanSuite1>, "Analysis Span Suite 1"},
       {Ask<HX_StabilizerHostSuite7>, "Stabilizer Host Suite 7"},
       {Ask<HX_OpaqueEffectDataSuite1>, "Opaque Effect Data Suite 1"},
       {Ask<HX_BlurSuite1>, "FLT Blur Suite 1"}};
