@@ -12,12 +12,10 @@ namespace {
 
 using Area = FrameDigest::Area;
 
-constexpr int kColumns = FrameDigest::kColumns, kRows = FrameDigest::kRows;
 constexpr int kHalfColumns = FrameDigest::kHalfColumns, kHalfRows = FrameDigest::kHalfRows;
 
 // A variance of cells, in 255ths squared, that says nothing: what noise and a coder leave.
-// Of a mean of four cells it leaves less.
-constexpr double kNoise = 4, kHalfNoise = 1;
+constexpr double kNoise = 4;
 
 Area Intersection(const Area& a, const Area& b) {
   return {std::max(a.left, b.left), std::max(a.top, b.top), std::min(a.right, b.right),
@@ -30,7 +28,7 @@ Area Moved(const Area& a, CellShift by) {
 // What either shows; bars of both are left out.
 Area SharedArea(const FrameDigest& a, const FrameDigest& b) {
   const Area area = Union(a.area, b.area);
-  return area.IsEmpty() ? Area{0, 0, kColumns, kRows} : area;
+  return area.IsEmpty() ? Area{0, 0, FrameDigest::kColumns, FrameDigest::kRows} : area;
 }
 
 // Whole cells of `half` within it.
@@ -96,10 +94,9 @@ struct HalfMatch {
   double correlation = -2;
 };
 
-// The best of the shifts about a middle one that leave at least `least` of the area. `noise`: a
-// variance that says nothing.
+// The best of the shifts about a middle one that leave at least `least` of the area.
 HalfMatch BestShift(const FrameDigest& a, const FrameDigest& b, const Area& area, CellShift middle,
-                    int reach_x, int reach_y, double least, double noise) {
+                    int reach_x, int reach_y, double least) {
   const AreaSums a_sums(a.half), b_sums(b.half);
   HalfMatch best;
   for (int y = middle.y - reach_y; y <= middle.y + reach_y; ++y) {
@@ -114,7 +111,7 @@ HalfMatch BestShift(const FrameDigest& a, const FrameDigest& b, const Area& area
                       1.0 * a_sums.Squares(in_a),
                       1.0 * b_sums.Squares(in_b),
                       1.0 * Products<kHalfColumns>(a.half.data(), b.half.data(), in_a, shift)};
-      const double correlation = m.cov() / std::sqrt((m.var_a() + noise) * (m.var_b() + noise));
+      const double correlation = m.cov() / std::sqrt((m.var_a() + kNoise) * (m.var_b() + kNoise));
       if (correlation > best.correlation) best = {shift, correlation};
     }
   }
@@ -124,7 +121,8 @@ HalfMatch BestShift(const FrameDigest& a, const FrameDigest& b, const Area& area
 // -- Blocks --
 
 constexpr int kBlocksAcross = 8, kBlocksDown = 4, kBlocks = kBlocksAcross * kBlocksDown;
-constexpr int kBlockWidth = kColumns / kBlocksAcross, kBlockHeight = kRows / kBlocksDown;
+constexpr int kBlockWidth = FrameDigest::kColumns / kBlocksAcross,
+              kBlockHeight = FrameDigest::kRows / kBlocksDown;
 // How far a block may lie beside the frame's shift, in cells, a 64th of the width each: what a turn
 // by some degrees, a zoom or depth do from one frame to the next.
 constexpr int kBeside = 3;
@@ -138,8 +136,9 @@ Moments BlockMoments(const FrameDigest& a, const FrameDigest& b, const Area& in_
   std::int32_t n = in_a.size(), sa = 0, sb = 0, aa = 0, bb = 0, ab = 0;
   const int width = in_a.right - in_a.left;
   for (int y = in_a.top; y < in_a.bottom; ++y) {
-    const std::uint8_t* const p = a.cells.data() + y * kColumns + in_a.left;
-    const std::uint8_t* const q = b.cells.data() + (y + by.y) * kColumns + in_a.left + by.x;
+    const std::uint8_t* const p = a.cells.data() + y * FrameDigest::kColumns + in_a.left;
+    const std::uint8_t* const q =
+        b.cells.data() + (y + by.y) * FrameDigest::kColumns + in_a.left + by.x;
     for (int x = 0; x < width; ++x) {
       sa += p[x];
       sb += q[x];
@@ -251,7 +250,7 @@ DigestMatch MatchOf(const FrameDigest& first, const FrameDigest& second) {
   const Area half = HalfOf(area);
   // Less than two fifths of a frame fit too easily.
   const HalfMatch whole = BestShift(first, second, half, {}, (half.right - half.left) / 2,
-                                    (half.bottom - half.top) / 2, 0.4, kNoise);
+                                    (half.bottom - half.top) / 2, 0.4);
   const CellShift shift{2 * whole.shift.x, 2 * whole.shift.y};
   const DigestMatch match = BlocksAbout(first, second, area, shift);
   // A title that comes or goes may draw the shift to itself where the picture repeats.
@@ -273,14 +272,17 @@ FrameDigest InTonesOf(const FrameDigest& first, const FrameDigest& second, CellS
   constexpr double kFew = 4;  // cells, fewer of which say nothing
   std::array<double, kTones> sums{}, counts{};
   const Area shared =
-      Intersection(SharedArea(first, second), Moved({0, 0, kColumns, kRows}, {-shift.x, -shift.y}));
+      Intersection(SharedArea(first, second),
+                   Moved({0, 0, FrameDigest::kColumns, FrameDigest::kRows}, {-shift.x, -shift.y}));
   for (int y = shared.top; y < shared.bottom; ++y) {
     for (int x = shared.left; x < shared.right; ++x) {
-      const double tone = first.cells[static_cast<std::size_t>(y * kColumns + x)] / kStep;
+      const double tone =
+          first.cells[static_cast<std::size_t>(y * FrameDigest::kColumns + x)] / kStep;
       const auto k = static_cast<std::size_t>(std::min(tone, kTones - 1.001));
       const double part = tone - static_cast<double>(k);
       const double value =
-          second.cells[static_cast<std::size_t>((y + shift.y) * kColumns + x + shift.x)];
+          second
+              .cells[static_cast<std::size_t>((y + shift.y) * FrameDigest::kColumns + x + shift.x)];
       sums[k] += (1 - part) * value;
       counts[k] += 1 - part;
       sums[k + 1] += part * value;
@@ -343,8 +345,9 @@ Mixture Fit(const FrameDigest& a, const FrameDigest& frame, const FrameDigest& b
   const auto centred = [n](std::int32_t product, std::int32_t x, std::int32_t y) {
     return (product - 1.0 * x * y / n) / n;
   };
-  const double vaa = centred(aa, sa, sa) + kHalfNoise, vbb = centred(bb, sb, sb) + kHalfNoise;
-  const double vff = centred(ff, sf, sf) + kHalfNoise, vab = centred(ab, sa, sb);
+  // A variance of 1 more is what rounding and noise leave of a mean of four.
+  const double vaa = centred(aa, sa, sa) + 1, vbb = centred(bb, sb, sb) + 1;
+  const double vff = centred(ff, sf, sf) + 1, vab = centred(ab, sa, sb);
   const double vaf = centred(af, sa, sf), vbf = centred(bf, sb, sf);
   const double determinant = vaa * vbb - vab * vab;
   Mixture m;
@@ -356,41 +359,29 @@ Mixture Fit(const FrameDigest& a, const FrameDigest& frame, const FrameDigest& b
   return m;
 }
 
-double LeftBy(const HalfMatch& match) {
-  const double c = std::max(0.0, match.correlation);
-  return 1 - c * c;
-}
-
 int Halved(int cells) {
   return cells >= 0 ? (cells + 1) / 2 : -((1 - cells) / 2);
 }
 
-HalfMatch PlaceAlone(const FrameDigest& first, const FrameDigest& second, const Area& area,
-                     CellShift about) {
-  // How far the sums of rounded shifts may be off, in cells of `half`.
-  constexpr int kReachX = 5, kReachY = 4;
-  return BestShift(first, second, area, {Halved(about.x), Halved(about.y)}, kReachX, kReachY, 0.5,
-                   kHalfNoise);
-}
-
 }  // namespace
-
-std::optional<double> LeftAlone(const FrameDigest& first, const FrameDigest& second,
-                                CellShift second_from_first) {
-  const Area area = HalfOf(SharedArea(first, second));
-  const HalfMatch match = PlaceAlone(first, second, area, second_from_first);
-  if (match.correlation < -1) return {};
-  return LeftBy(match);
-}
 
 std::optional<Mixture> MixtureOf(const FrameDigest& a, const FrameDigest& frame,
                                  const FrameDigest& b, CellShift frame_from_a,
                                  CellShift frame_from_b, double worth) {
+  // How far the sums of rounded shifts may be off, in cells of `half`.
+  constexpr int kReachX = 5, kReachY = 4;
+  constexpr double kLeast = 0.5;
   const Area area = HalfOf(SharedArea(a, b));
-  const HalfMatch alone_a = PlaceAlone(a, frame, area, frame_from_a);
-  const HalfMatch alone_b = PlaceAlone(b, frame, area, frame_from_b);
+  const HalfMatch alone_a = BestShift(
+      a, frame, area, {Halved(frame_from_a.x), Halved(frame_from_a.y)}, kReachX, kReachY, kLeast);
+  const HalfMatch alone_b = BestShift(
+      b, frame, area, {Halved(frame_from_b.x), Halved(frame_from_b.y)}, kReachX, kReachY, kLeast);
   if (alone_a.correlation < -1 || alone_b.correlation < -1) return {};
-  if (LeftBy(alone_a) < worth || LeftBy(alone_b) < worth) return {};
+  const auto left = [](const HalfMatch& match) {
+    const double c = std::max(0.0, match.correlation);
+    return 1 - c * c;
+  };
+  if (left(alone_a) < worth || left(alone_b) < worth) return {};
   // One and then the other moves to its best place beside the other (coordinate descent).
   CellShift places[2] = {alone_a.shift, alone_b.shift};
   constexpr double kLeastOfBoth = 0.3;
@@ -413,8 +404,8 @@ std::optional<Mixture> MixtureOf(const FrameDigest& a, const FrameDigest& frame,
     }
     if (!moved) break;
   }
-  best.first_left = LeftBy(alone_a);
-  best.second_left = LeftBy(alone_b);
+  best.first_left = left(alone_a);
+  best.second_left = left(alone_b);
   return best;
 }
 
