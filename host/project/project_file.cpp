@@ -12,6 +12,7 @@
 #include <functional>
 #include <limits>
 #include <type_traits>
+#include <utility>
 #include <vector>
 
 #include "host/media/clip_files.h"
@@ -26,20 +27,22 @@ namespace fs = std::filesystem;
 using tessel::utility::Guid;
 
 constexpr std::int64_t kApplicationId = 0x43616c6d;  // "Calm", in the database's header
-// 1: the first. 2: the pixels' aspect; it was not told before. 3: the clip's frames.
-constexpr std::int64_t kVersion = 4;
+// 1: the first. 2: the pixels' aspect; it was not told before. 3: the clip's frames. 4: the choice.
+// 5: several shots, where one stood among the settings before.
+constexpr std::int64_t kVersion = 5;
 
 constexpr char kChecksum[] = "checksum";
 constexpr char kCreate[] =
+    "DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS parameter; DROP TABLE IF EXISTS instance;"
+    "DROP TABLE IF EXISTS frames; DROP TABLE IF EXISTS shot;"
     "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
-    "CREATE TABLE parameter (disk_id INTEGER PRIMARY KEY, value REAL NOT NULL);"
-    "CREATE TABLE instance (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
-    "PRAGMA application_id = 1130458221;";
-constexpr char kCreateFrames[] =
-    "CREATE TABLE IF NOT EXISTS frames (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT "
-    "NULL)";
-constexpr char kMarkVersion[] = "PRAGMA user_version = 4";
-static_assert(kApplicationId == 1130458221 && kVersion == 4);
+    "CREATE TABLE shot (number INTEGER PRIMARY KEY, start_frame INTEGER NOT NULL,"
+    " length INTEGER NOT NULL, choice TEXT NOT NULL, instance BLOB NOT NULL);"
+    "CREATE TABLE parameter (shot INTEGER, disk_id INTEGER, value REAL NOT NULL,"
+    " PRIMARY KEY (shot, disk_id)) WITHOUT ROWID;"
+    "CREATE TABLE frames (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
+    "PRAGMA application_id = 1130458221; PRAGMA user_version = 5;";
+static_assert(kApplicationId == 1130458221 && kVersion == 5);
 
 [[noreturn]] void Fail(const std::string& path, const std::string& cause) {
   throw ProjectFailure(path + ": " + cause);
@@ -74,21 +77,24 @@ static_assert(kApplicationId == 1130458221 && kVersion == 4);
 // both ways.
 template <class Record, class Visit>
 void VisitSettings(Record& project, std::int64_t version, const Visit& visit) {
+  auto& first = project.shots.front();
   visit("clip_path", project.clip_path);
   visit("clip_relative", project.clip_relative);
   visit("clip_content", project.clip_content);
   visit("width", project.width);
   visit("height", project.height);
-  visit("start_frame", project.start_frame);
-  visit("length", project.length);
+  if (version < 5) {
+    visit("start_frame", first.start_frame);
+    visit("length", first.length);
+  }
   visit("ticks_per_frame", project.ticks_per_frame);
   visit("field_type", project.field_type);
-  visit("match_name", project.effect.match_name);
+  visit("match_name", first.effect.match_name);
   if (version < 2) return;
   visit("pixel_aspect_num", project.pixel_aspect.num);
   visit("pixel_aspect_den", project.pixel_aspect.den);
-  if (version < 4) return;
-  visit("choice", project.choice);
+  if (version == 4) visit("choice", first.choice);
+  if (version >= 5) visit("end_frame", project.end_frame);
 }
 
 // Over all that a project holds. SQLite reads a cut or flipped page as it finds it.
@@ -108,11 +114,19 @@ Guid ChecksumOf(const Project& project, std::int64_t version) {
       mix(&number, sizeof number);
     }
   });
-  for (const auto& [disk_id, value] : project.effect.values) {
-    mix(&disk_id, sizeof disk_id);
-    mix(&value, sizeof value);
+  for (const SavedShot& shot : project.shots) {
+    if (version >= 5) {
+      const std::int64_t told[] = {shot.start_frame, shot.length,
+                                   static_cast<std::int64_t>(shot.choice.size())};
+      mix(told, sizeof told);
+      mix(shot.choice.data(), shot.choice.size());
+    }
+    for (const auto& [disk_id, value] : shot.effect.values) {
+      mix(&disk_id, sizeof disk_id);
+      mix(&value, sizeof value);
+    }
+    mix(shot.effect.instance.data(), shot.effect.instance.size());
   }
-  mix(project.effect.instance.data(), project.effect.instance.size());
   if (version >= 3) mix(project.clip_frames.data(), project.clip_frames.size());
   return sum;
 }
@@ -120,17 +134,22 @@ Guid ChecksumOf(const Project& project, std::int64_t version) {
 // Whatever a project tells, memory is taken for frames of this size and a span of so many, and no
 // time in ticks leaves 64 bits, which twice the span and a frame more must fit into.
 bool IsWithinRanges(const Project& project) {
-  constexpr auto kFrames = static_cast<std::int64_t>(media::kMaximumFrames);
-  const std::int64_t start = project.start_frame, length = project.length;
   if (project.width < 0 || project.height < 0 ||
       std::int64_t{project.width} * project.height > media::kMaximumPixels) {
     return false;
   }
-  if (start < -kFrames || start > kFrames || length < 0 || length > kFrames) return false;
-  const std::int64_t most =
-      std::numeric_limits<std::int64_t>::max() / (2 * (std::abs(start) + length + 1));
-  return project.ticks_per_frame > 0 && project.ticks_per_frame <= most &&
-         project.field_type >= HX_FIELD_PROGRESSIVE &&
+  constexpr auto kFrames = static_cast<std::int64_t>(media::kMaximumFrames);
+  std::int64_t last_end = std::numeric_limits<std::int64_t>::min();
+  for (const SavedShot& shot : project.shots) {
+    const std::int64_t start = shot.start_frame, length = shot.length;
+    if (start < -kFrames || start > kFrames || length < 0 || length > kFrames) return false;
+    if (start < std::exchange(last_end, start + length)) return false;
+    const std::int64_t most =
+        std::numeric_limits<std::int64_t>::max() / (2 * (std::abs(start) + length + 1));
+    if (project.ticks_per_frame > most) return false;
+  }
+  if (project.end_frame < last_end || project.end_frame > kFrames) return false;
+  return project.ticks_per_frame > 0 && project.field_type >= HX_FIELD_PROGRESSIVE &&
          project.field_type <= HX_FIELD_SECOND_ORDER && project.pixel_aspect.num > 0 &&
          project.pixel_aspect.den != 0;
 }
@@ -184,34 +203,72 @@ struct SettingReader {
   }
 };
 
-void WriteBytes(SqliteDatabase& database, const char* insert,
-                const std::vector<std::uint8_t>& bytes) {
-  SqliteStatement statement(database, insert);
-  statement.Bind(1, bytes);
-  statement.Step();
-}
-
-// `select`: of one row, its length and its bytes.
-std::vector<std::uint8_t> ReadBytes(SqliteDatabase& database, const std::string& path,
-                                    const char* select, std::size_t most) {
-  SqliteStatement statement(database, select);
-  if (!statement.Step()) throw SqliteError(SQLITE_CORRUPT, select);
-  if (statement.Integer(0) > static_cast<std::int64_t>(most)) FailForSize(path, most);
-  return statement.Bytes(1);
+// A blob whose length stands in the column before it.
+std::vector<std::uint8_t> BytesOf(const SqliteStatement& row, int column, const std::string& path,
+                                  std::size_t most) {
+  if (row.Integer(column - 1) > static_cast<std::int64_t>(most)) FailForSize(path, most);
+  return row.Bytes(column);
 }
 
 void Write(SqliteDatabase& database, const Project& project) {
   SqliteStatement setting(database, "INSERT INTO setting VALUES (?, ?)");
   VisitSettings(project, kVersion, SettingWriter{setting});
   SettingWriter{setting}(kChecksum, ChecksumOf(project, kVersion));
-  SqliteStatement parameter(database, "INSERT INTO parameter VALUES (?, ?)");
-  for (const auto& [disk_id, value] : project.effect.values) {
-    parameter.Bind(1, std::int64_t{disk_id});
-    parameter.Bind(2, value);
-    parameter.Step();
+  SqliteStatement row(database, "INSERT INTO shot VALUES (?, ?, ?, ?, ?)");
+  SqliteStatement parameter(database, "INSERT INTO parameter VALUES (?, ?, ?)");
+  std::int64_t number = 0;
+  for (const SavedShot& shot : project.shots) {
+    row.Bind(1, ++number);
+    row.Bind(2, std::int64_t{shot.start_frame});
+    row.Bind(3, std::int64_t{shot.length});
+    row.Bind(4, shot.choice);
+    row.Bind(5, shot.effect.instance);
+    row.Step();
+    for (const auto& [disk_id, value] : shot.effect.values) {
+      parameter.Bind(1, number);
+      parameter.Bind(2, std::int64_t{disk_id});
+      parameter.Bind(3, value);
+      parameter.Step();
+    }
   }
-  WriteBytes(database, "INSERT INTO instance VALUES (1, ?)", project.effect.instance);
-  WriteBytes(database, "INSERT INTO frames VALUES (1, ?)", project.clip_frames);
+  SqliteStatement frames(database, "INSERT INTO frames VALUES (1, ?)");
+  frames.Bind(1, project.clip_frames);
+  frames.Step();
+}
+
+void ReadShots(SqliteDatabase& database, const std::string& path, std::size_t most,
+               Project& project) {
+  const std::string match_name = project.shots.front().effect.match_name;
+  project.shots.clear();
+  SqliteStatement row(database,
+                      "SELECT number, start_frame, length, choice, length(instance), instance "
+                      "FROM shot ORDER BY number");
+  SqliteStatement parameter(database, "SELECT disk_id, value FROM parameter WHERE shot = ?");
+  while (row.Step()) {
+    SavedShot& shot = project.shots.emplace_back();
+    shot.start_frame = static_cast<std::int32_t>(row.Integer(1));
+    shot.length = static_cast<std::int32_t>(row.Integer(2));
+    shot.choice = row.Text(3);
+    shot.effect.match_name = match_name;
+    shot.effect.instance = BytesOf(row, 5, path, most);
+    parameter.Bind(1, row.Integer(0));
+    while (parameter.Step()) {
+      shot.effect.values[static_cast<std::int32_t>(parameter.Integer(0))] = parameter.Real(1);
+    }
+  }
+  if (project.shots.empty()) throw SqliteError(SQLITE_CORRUPT, "shot");
+}
+
+// The one shot of files before version 5.
+void ReadShot(SqliteDatabase& database, const std::string& path, std::size_t most,
+              SavedShot& shot) {
+  SqliteStatement parameter(database, "SELECT disk_id, value FROM parameter");
+  while (parameter.Step()) {
+    shot.effect.values[static_cast<std::int32_t>(parameter.Integer(0))] = parameter.Real(1);
+  }
+  SqliteStatement instance(database, "SELECT length(bytes), bytes FROM instance");
+  if (!instance.Step()) throw SqliteError(SQLITE_CORRUPT, "instance");
+  shot.effect.instance = BytesOf(instance, 1, path, most);
 }
 
 std::int64_t CheckedVersion(const std::string& path, SqliteDatabase& database) {
@@ -241,8 +298,6 @@ void Create(const fs::path& path, const Project& project) {
       SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
       database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
       database.Run(kCreate);
-      database.Run(kCreateFrames);
-      database.Run(kMarkVersion);
       Write(database, project);
       database.Run("COMMIT");
     }
@@ -260,20 +315,18 @@ void Replace(const fs::path& path, const Project& project) {
   SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
   CheckedVersion(path, database);
   database.Run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
-  database.Run(kCreateFrames);
-  database.Run(
-      "DELETE FROM setting; DELETE FROM parameter; DELETE FROM instance; DELETE FROM frames");
+  database.Run(kCreate);
   Write(database, project);
-  database.Run(kMarkVersion);
   database.Run("COMMIT");
 }
 
 }  // namespace
 
 void SaveProject(const std::string& path, const Project& project, std::size_t most) try {
-  if (std::max(project.effect.instance.size(), project.clip_frames.size()) > most) {
-    FailForSize(path, most);
+  for (const SavedShot& shot : project.shots) {
+    if (shot.effect.instance.size() > most) FailForSize(path, most);
   }
+  if (project.clip_frames.size() > most) FailForSize(path, most);
   std::error_code error;
   const fs::path place = fs::weakly_canonical(fs::absolute(path), error);
   Project saved = project;
@@ -300,15 +353,17 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   Project project;
   SqliteStatement setting(database, "SELECT value FROM setting WHERE key = ?");
   VisitSettings(project, version, SettingReader{setting});
-  SqliteStatement parameter(database, "SELECT disk_id, value FROM parameter");
-  while (parameter.Step()) {
-    project.effect.values[static_cast<std::int32_t>(parameter.Integer(0))] = parameter.Real(1);
+  if (version < 5) {
+    SavedShot& shot = project.shots.front();
+    ReadShot(database, path, most, shot);
+    project.end_frame = static_cast<std::int32_t>(std::int64_t{shot.start_frame} + shot.length);
+  } else {
+    ReadShots(database, path, most, project);
   }
-  project.effect.instance =
-      ReadBytes(database, path, "SELECT length(bytes), bytes FROM instance", most);
   if (version >= 3) {
-    project.clip_frames =
-        ReadBytes(database, path, "SELECT length(bytes), bytes FROM frames", most);
+    SqliteStatement frames(database, "SELECT length(bytes), bytes FROM frames");
+    if (!frames.Step()) throw SqliteError(SQLITE_CORRUPT, "frames");
+    project.clip_frames = BytesOf(frames, 1, path, most);
   }
   Guid checksum;
   SettingReader{setting}(kChecksum, checksum);

@@ -11,7 +11,17 @@
 
 namespace calmframe::host {
 
-// Saved work: a clip on a layer, the effect on it, and what the effect remembers.
+// The saved work of one shot: the layer that shows it, the effect on it, and what the effect
+// remembers.
+struct SavedShot {
+  std::int32_t start_frame = 0, length = 0;  // of the layer; see LayerState
+  SavedEffect effect;
+  // JSON: what was chosen for the shot besides the controls; empty: nothing. See stabilize's
+  // Choice.
+  std::string choice;
+};
+
+// Saved work: a clip, and what was made of its shots.
 struct Project {
   std::string clip_path;               // absolute, when the project was saved
   std::string clip_relative;           // to the project's folder; empty where there is no such way
@@ -22,14 +32,15 @@ struct Project {
   std::int32_t width = 0, height = 0;  // of the clip's frames
   HX_Ratio pixel_aspect{1, 1};         // width : height of one of their pixels
 
-  std::int32_t start_frame = 0, length = 0;  // of the layer; see LayerState
-  std::int64_t ticks_per_frame = 0;
+  std::int64_t ticks_per_frame = 0;  // of the layers
   std::int32_t field_type = 0;
 
-  SavedEffect effect;
-  // JSON: what was chosen for the clip besides the controls; empty: nothing. See stabilize's
-  // Choice.
-  std::string choice;
+  // Where the stretch that is worked ends, in the clip's frames: behind the last shot, or further
+  // on where a run was stopped before it had come there.
+  std::int32_t end_frame = 0;
+
+  // One behind the other, at least one: of a clip without cuts it is the whole of what is worked.
+  std::vector<SavedShot> shots = std::vector<SavedShot>(1);
 };
 
 // One line that names the file and the cause.
@@ -38,7 +49,7 @@ class ProjectFailure : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
-// Of a flattened instance, and of the clip's frames; SQLite holds not much more in one row.
+// Of one flattened instance, and of the clip's frames; SQLite holds not much more in one row.
 constexpr std::size_t kMaximumInstanceBytes = std::size_t{900} << 20;
 
 // The project's paths are made from clip_path and the project's own place. Whatever ends the

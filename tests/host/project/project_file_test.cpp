@@ -34,21 +34,34 @@ class ProjectTest : public testing::Test, protected ScratchFolder {
     project.width = 1920;
     project.height = 1080;
     project.pixel_aspect = {64, 45};
-    project.start_frame = -3;
-    project.length = 495 + mark;
     project.ticks_per_frame = 23543520;
     project.field_type = 1;
-    project.effect.match_name = "KLPX SubspaceStabilizer";
-    project.effect.values = {{4, 150.0}, {20, 0.1 + mark}, {302, 9808}};
-    project.effect.instance.assign(bytes, static_cast<std::uint8_t>(mark));
+    for (int shot = 0; shot <= mark; ++shot) {
+      project.shots.resize(static_cast<std::size_t>(shot) + 1);
+      SavedShot& saved = project.shots.back();
+      saved.start_frame = 1000 * shot - 3;
+      saved.length = 495 + mark;
+      saved.effect.match_name = "KLPX SubspaceStabilizer";
+      saved.effect.values = {{4, 150.0}, {20, 0.1 + mark}, {302, 9808 + shot}};
+      saved.effect.instance.assign(bytes, static_cast<std::uint8_t>(mark + shot));
+      project.end_frame = saved.start_frame + saved.length + 7;  // a run that was stopped
+      saved.choice = shot == 1 ? "{\"still\":\"all\"}" : "";
+    }
     return project;
   }
 
   // All that is saved of one.
   static auto All(const Project& p) {
-    return std::tie(p.width, p.height, p.pixel_aspect.num, p.pixel_aspect.den, p.start_frame,
-                    p.length, p.ticks_per_frame, p.field_type, p.clip_content, p.clip_frames,
-                    p.effect.match_name, p.effect.values, p.effect.instance);
+    std::vector<std::tuple<std::int32_t, std::int32_t, std::string, ParamValues,
+                           std::vector<std::uint8_t>, std::string>>
+        shots;
+    for (const SavedShot& s : p.shots) {
+      shots.emplace_back(s.start_frame, s.length, s.effect.match_name, s.effect.values,
+                         s.effect.instance, s.choice);
+    }
+    return std::make_tuple(p.width, p.height, p.pixel_aspect.num, p.pixel_aspect.den,
+                           p.ticks_per_frame, p.field_type, p.end_frame, p.clip_content,
+                           p.clip_frames, shots);
   }
 };
 
@@ -106,7 +119,10 @@ TEST_F(ProjectTest, ProjectsOfOlderVersionsAreTakenAndReplaced) {
         "INSERT INTO instance VALUES (1, X'010203');";
     SqliteDatabase(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE).Run(sql.c_str());
     const Project project = LoadProject(path);
-    EXPECT_EQ(project.length, 495);
+    EXPECT_EQ(project.shots.at(0).length, 495);
+    EXPECT_EQ(project.end_frame, 492);
+    EXPECT_EQ(project.shots.at(0).effect.values, (ParamValues{{20, 50.0}}));
+    EXPECT_EQ(project.shots.at(0).effect.instance, (std::vector<std::uint8_t>{1, 2, 3}));
     EXPECT_EQ(project.pixel_aspect.num, c.aspect_num);
     EXPECT_EQ(project.pixel_aspect.den, c.aspect_den);
     EXPECT_TRUE(project.clip_frames.empty());
@@ -123,7 +139,7 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
   SqliteDatabase(In("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
       .Run("CREATE TABLE t (x)");
   SaveProject(In("newer.calm"), Sample(1));
-  SqliteDatabase(In("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 5");
+  SqliteDatabase(In("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 6");
   SaveProject(In("large.calm"), Sample(1, 5000), 5000);
   EXPECT_TRUE(All(LoadProject(In("large.calm"), 5000)) == All(Sample(1, 5000)));
   const struct {
@@ -181,16 +197,29 @@ TEST_F(ProjectTest, WhatNoClipOnALayerTellsIsDamage) {
                {20, 20, 0, 1, 1, 3, false},
                {20, 20, 0, 1, 1, -1, false}};
   for (const auto& c : cases) {
-    Project project = Sample(1, 10);
-    std::tie(project.width, project.height, project.start_frame, project.length,
+    Project project = Sample(0, 10);
+    std::tie(project.width, project.height, project.shots[0].start_frame, project.shots[0].length,
              project.ticks_per_frame, project.field_type) =
         std::tie(c.width, c.height, c.start_frame, c.length, c.ticks, c.field_type);
+    project.end_frame = c.start_frame + c.length;
     SaveProject(In("ranges.calm"), project);
     const auto load = [&] { LoadProject(In("ranges.calm")); };
     if (c.loads) {
       EXPECT_NO_THROW(load());
     } else {
       EXPECT_THAT(load, IsRefused("is damaged")) << &c - cases;
+    }
+  }
+  Project two = Sample(1, 10);  // the first shot ends before frame 493, the second has 496
+  for (const auto& [second, end] : {std::pair(493, 989), {492, 989}, {493, 988}}) {
+    two.shots[1].start_frame = second;
+    two.end_frame = end;
+    SaveProject(In("two.calm"), two);
+    const auto load = [&] { LoadProject(In("two.calm")); };
+    if (second == 493 && end == 989) {
+      EXPECT_NO_THROW(load());
+    } else {
+      EXPECT_THAT(load, IsRefused("is damaged"));
     }
   }
 }
@@ -233,7 +262,7 @@ TEST_F(ProjectTest, AnyStepOfASaveMayBeTheLast) {
         continue;
       }
       const Project kept = LoadProject(path);
-      const int mark = kept.length - 495;
+      const int mark = kept.shots.at(0).length - 495;
       EXPECT_TRUE(mark == 2 || (mark == 1 && was_there && status != 0)) << mark;
       EXPECT_GE(mark, seen) << "what was saved stays saved";
       seen = mark;
