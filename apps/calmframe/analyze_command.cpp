@@ -3,7 +3,9 @@
 #include <cstdio>
 #include <memory>
 #include <nlohmann/json.hpp>
+#include <vector>
 
+#include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/stabilize_command.h"
@@ -12,6 +14,15 @@
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
+namespace {
+
+struct Analysed {
+  media::FrameRange range;
+  std::unique_ptr<host::CropWindow> crop;
+  std::string text;
+};
+
+}  // namespace
 
 AnalyzeCommand::AnalyzeCommand(CLI::App& program)
     : Command(AddCommand(
@@ -28,6 +39,7 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
           "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
   AddControlFlags(parser_, controls_);
   AddStretchFlags(parser_, stretch_, BareNumber::seconds);
+  AddShotsFlag(parser_, shots_);
   AddProjectFlag(parser_, project_);
   AddRunFlags(parser_, run_);
 }
@@ -39,33 +51,52 @@ void AnalyzeCommand::Run() {
 }
 
 void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) const {
-  const std::unique_ptr<host::SteadyClip> taken =
-      TakeUp(input_, project_, controls_, opening, stretch_);
-  host::SteadyClip& clip = *taken;
-  const media::ClipInfo& info = clip.info();
+  const std::unique_ptr<host::Film> film = TakeUp(input_, project_, opening, stretch_, shots_);
+  const media::ClipInfo info = film->info();
   if (!info.warning.empty()) progress.Warn(info.warning);
-  const Unsaved unsaved = WorkAndLeave(clip, project_, progress);
-  // The effect's own window is no trouble where it isn't what is shown.
-  const bool follows = host::Follows(clip, {});
-  if (!follows) TellTrouble(host::CropTroubleOf(clip), clip, progress);
+  Unsaved unsaved;
+  std::vector<Analysed> shots;
+  while (host::SteadyClip* const shot = NextShot(*film, controls_)) {
+    progress.OfShot(film->number() > 0 ? film->number() + 1 : 0);
+    unsaved = WorkAndLeave(*film, *shot, project_, progress);
+    // The effect's own window is no trouble where it isn't what is shown.
+    const bool follows = host::Follows(*shot, {});
+    if (!follows) TellTrouble(host::CropTroubleOf(*shot), *shot, progress);
+    shots.push_back({shot->range(), shot->Crop(),
+                     shot->CropText() + (follows ? ", with --window steady" : "")});
+  }
+  progress.OfShot(0);
   if (run_.json) {
-    const std::unique_ptr<host::CropWindow> crop = clip.Crop();
     nlohmann::ordered_json json;
     json["clip"] = input_;
     json["width"] = info.width;
     json["height"] = info.height;
     json["frames"] = info.frame_count;
-    if (crop) {
-      json["crop_width"] = crop->width;
-      json["crop_height"] = crop->height;
+    nlohmann::ordered_json list = nlohmann::ordered_json::array();
+    for (const Analysed& shot : shots) {
+      nlohmann::ordered_json told;
+      told["first_frame"] = shot.range.first;
+      told["end_frame"] = shot.range.end;
+      nlohmann::ordered_json& crop_of = shots.size() == 1 ? json : told;
+      if (shot.crop) {
+        crop_of["crop_width"] = shot.crop->width;
+        crop_of["crop_height"] = shot.crop->height;
+      }
+      list.push_back(told);
     }
+    if (shots.size() > 1) json["shots"] = list;
     std::printf("%s\n", JsonLine(json).c_str());
     return unsaved.Throw();
   }
   std::printf("%s: %zu %s of %dx%d\n", input_.c_str(), info.frame_count,
               info.frame_count == 1 ? "frame" : "frames", info.width, info.height);
-  if (const std::string text = clip.CropText(); !text.empty()) {
-    std::printf("%s%s\n", text.c_str(), follows ? ", with --window steady" : "");
+  for (std::size_t s = 0; s < shots.size(); ++s) {
+    if (shots.size() > 1) {
+      std::printf("shot %zu, %s to %s%s", s + 1,
+                  TimeText(film->whole(), shots[s].range.first).c_str(),
+                  TimeText(film->whole(), shots[s].range.end).c_str(), shots[s].crop ? ": " : "\n");
+    }
+    if (shots[s].crop) std::printf("%s\n", shots[s].text.c_str());
   }
   unsaved.Throw();
 }

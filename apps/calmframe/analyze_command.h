@@ -6,7 +6,7 @@
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/stabilize_command.h"
-#include "host/stabilize/steady_clip.h"
+#include "host/stabilize/film.h"
 
 namespace calmframe {
 
@@ -23,6 +23,7 @@ class AnalyzeCommand final : public Command {
 
   std::string input_, project_;
   Stretch stretch_;
+  host::ShotRequest shots_;
   ControlFlags controls_;
   RunFlags run_;
 };

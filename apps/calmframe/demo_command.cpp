@@ -108,7 +108,8 @@ void DemoCommand::Run() {
 
   try {
     WriteSample(shaky, frames_, flags.encode, run_.threads, progress);
-    Stabilize(shaky, steady, "", {}, controls_, flags, run_.threads, progress);
+    Stabilize(shaky, steady, "", {}, {.kind = host::ShotRequest::Kind::one}, controls_, flags,
+              run_.threads, progress);
   } catch (...) {
     if (made) std::filesystem::remove(directory_, error);  // where nothing is in it
     throw;

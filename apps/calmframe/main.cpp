@@ -28,6 +28,7 @@
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/project_commands.h"
 #include "apps/calmframe/report_command.h"
+#include "apps/calmframe/shots_command.h"
 #include "apps/calmframe/stabilize_command.h"
 #include "host/base/nearest_match.h"
 #include "host/media/clip.h"
@@ -161,6 +162,7 @@ int Run(int argc, char** argv) {
   DemoCommand demo(program);
   AnalyzeCommand analyze(program);
   ParamsCommand params(program);
+  ShotsCommand shots(program);
   RenderCommand render(program);
   InfoCommand info(program);
   TracksCommand tracks(program);
@@ -171,8 +173,8 @@ int Run(int argc, char** argv) {
   WriteCommand bash(program, "write-bash-completion", manual::BashCompletion);
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
-  Command* const commands[] = {&stabilize, &demo,   &analyze,  &params, &render, &info,
-                               &tracks,    &report, &man_page, &bash,   &zsh,    &fish};
+  Command* const commands[] = {&stabilize, &demo,   &analyze,  &params, &shots, &render, &info,
+                               &tracks,    &report, &man_page, &bash,   &zsh,   &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;

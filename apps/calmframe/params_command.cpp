@@ -68,7 +68,7 @@ void ParamsCommand::Run() {
   try {
     const host::Host host(PluginPath(), settings);
     std::map<std::int32_t, double> given = ResolveControls(controls_, host.declarations());
-    if (!project_.empty()) given.merge(host::LoadProject(project_).effect.values);
+    if (!project_.empty()) given.merge(host::LoadProject(project_).shots.front().effect.values);
     for (const HX_ParamDef& param : OfferedParams(controls_, host.declarations())) {
       if (!IsControl(param)) continue;
       const auto found = given.find(param.disk_id);

@@ -78,8 +78,9 @@ std::string ProgressText(const Progress& progress, double elapsed_seconds) {
   return text;
 }
 
-std::string ProgressJson(const Progress& progress, double elapsed_seconds) {
+std::string ProgressJson(const Progress& progress, double elapsed_seconds, std::size_t shot) {
   nlohmann::ordered_json json;
+  if (shot > 0) json["shot"] = shot;
   json["stage"] = progress.stage;
   if (progress.ends || progress.total > 0) json["share"] = ShareOf(progress);
   if (!progress.unit.empty() && progress.total > 0) {
@@ -118,15 +119,19 @@ void ProgressLine::Show(const Progress& progress) {
   if (!begins && !progress.ends && !is_due) return;
   last_shown_ = now;
   if (form_ == Form::json) {
-    std::fprintf(stderr, "%s\n", ProgressJson(progress, elapsed).c_str());
+    std::fprintf(stderr, "%s\n", ProgressJson(progress, elapsed, shot_).c_str());
   } else {
-    Write(ProgressText(progress, elapsed), progress.ends);
+    Write(Prefix() + ProgressText(progress, elapsed), progress.ends);
   }
   if (progress.ends) stage_.clear();
 }
 
+std::string ProgressLine::Prefix() const {
+  return shot_ > 0 ? "shot " + std::to_string(shot_) + ": " : "";
+}
+
 void ProgressLine::Warn(const std::string& line) {
-  if (warned_.insert(line).second) Tell("warning", line);
+  if (warned_.insert(Prefix() + line).second) Tell("warning", Prefix() + line);
 }
 
 bool ProgressLine::Stops() {
@@ -134,7 +139,7 @@ bool ProgressLine::Stops() {
 }
 
 void ProgressLine::Note(const std::string& line) {
-  if (form_ == Form::line || form_ == Form::json) Tell("note", line);
+  if (form_ == Form::line || form_ == Form::json) Tell("note", Prefix() + line);
 }
 
 void ProgressLine::End(const std::string& line, nlohmann::ordered_json object) {

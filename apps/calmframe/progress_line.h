@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <nlohmann/json_fwd.hpp>
 #include <set>
 #include <string>
@@ -24,6 +25,9 @@ class ProgressLine final : public host::Watcher {
   ProgressLine(const ProgressLine&) = delete;
   ProgressLine& operator=(const ProgressLine&) = delete;
 
+  // What is told from now on is of this shot of a film, counted from 1; 0: of all.
+  void OfShot(std::size_t number) { shot_ = number; }
+
   void Show(const Progress& progress) override;
   // In every form; said once, however often it comes.
   void Warn(const std::string& line) override;
@@ -39,8 +43,11 @@ class ProgressLine final : public host::Watcher {
   void Write(const std::string& text, bool last);
   void Tell(const char* key, const std::string& line);
 
+  std::string Prefix() const;
+
   const Form form_;
   const bool terminal_;
+  std::size_t shot_ = 0;
   std::string stage_;
   std::chrono::steady_clock::time_point stage_begin_;
   std::chrono::steady_clock::time_point last_shown_;
@@ -55,9 +62,9 @@ std::string JsonLine(const nlohmann::ordered_json& json);
 // One line of a stage, without a newline: "rendering   42 %  126/300 frames  18.3 frames/s  0:09
 // left". What the effect says takes the place of the numbers that it tells.
 std::string ProgressText(const Progress& progress, double elapsed_seconds);
-// The same as a JSON object: "stage", "elapsed" in seconds, "ended" at its end, and what is known
-// of "share" (0 to 1), "done", "total", "unit", "says".
-std::string ProgressJson(const Progress& progress, double elapsed_seconds);
+// The same as a JSON object: "shot" of a film's, "stage", "elapsed" in seconds, "ended" at its end,
+// and what is known of "share" (0 to 1), "done", "total", "unit", "says".
+std::string ProgressJson(const Progress& progress, double elapsed_seconds, std::size_t shot = 0);
 
 // From now on the first Ctrl-C (or SIGTERM, or the terminal's end) asks the running stage to end; a
 // second one ends the program at once.

@@ -6,6 +6,7 @@
 #include <optional>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
@@ -17,6 +18,14 @@
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
+namespace {
+
+std::int32_t EndOf(const host::SavedShot& shot) {
+  return shot.start_frame + shot.length;
+}
+
+}  // namespace
+
 RenderCommand::RenderCommand(CLI::App& program)
     : Command(AddCommand(
           program, "render",
@@ -40,34 +49,26 @@ void RenderCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
   CheckOrder(stretch_);
-  const std::unique_ptr<host::SteadyClip> clip = OpenSaved(project_);
-  const media::FrameRange range = RangeOf(*clip);
-  // As the clip's own frames; the rest counts from the first that was worked.
-  const media::FrameRange part{range.first - clip->range().first, range.end - clip->range().first};
-  KeepApart(output_, {project_, clip->path()});
-  const media::ClipInfo written = media::PartOf(clip->whole(), range);
+  const std::unique_ptr<host::Film> film = OpenSaved(project_);
+  const media::FrameRange range = RangeOf(*film);
+  KeepApart(output_, {project_, film->whole().path});
+  const media::ClipInfo written = media::PartOf(film->whole(), range);
   const std::unique_ptr<media::ClipWriter> writer =
       media::ClipWriter::Create(output_, written, written.width, written.height, flags_.encode);
   const std::unique_ptr<SideBySide> both =
-      MakeSideBySide(flags_, written, output_, {project_, clip->path()});
+      MakeSideBySide(flags_, written, output_, {project_, film->whole().path});
   TellLosses(*writer, both.get(), progress);
-  Unsaved unsaved = WorkAndLeave(*clip, project_, progress);
-  Frame(*clip, flags_.window, progress);
-  if (clip->has_new_choice()) unsaved = Leave(*clip, project_);
-  RenderClip(*clip, part, SettingsOf(flags_, run_.threads), *writer, both.get(), progress);
-  TellOutcome(*clip, progress);
-  unsaved.Throw();
-  if (both) both->Throw();
+  SteadyFilm(*film, range, project_, {}, flags_, run_.threads, *writer, both.get(), progress);
 }
 
-media::FrameRange RenderCommand::RangeOf(const host::SteadyClip& clip) const {
-  if (!stretch_.is_given()) return clip.range();
-  media::FrameRange range = FramesOf(stretch_, clip.whole());
-  const media::FrameRange& worked = clip.range();
+media::FrameRange RenderCommand::RangeOf(const host::Film& film) const {
+  if (!stretch_.is_given()) return film.range();
+  media::FrameRange range = FramesOf(stretch_, film.whole());
+  const media::FrameRange& worked = film.range();
   if (!stretch_.from) range.first = worked.first;
   if (!stretch_.to) range.end = worked.end;
   if (range.first >= range.end || !worked.Holds(range)) {
-    throw UsageFailure(project_ + ": " + WorkedText(clip) +
+    throw UsageFailure(project_ + ": " + WorkedText(film) +
                        ", and --from and --to must lie within");
   }
   return range;
@@ -90,9 +91,13 @@ void InfoCommand::Run() {
   } catch (const host::ProjectFailure& failure) {
     trouble = failure.what();
   }
-  const std::optional<host::Choice> choice = host::Choice::Parse(project.choice);
   const double rate =
       static_cast<double>(HX_TICKS_PER_SECOND) / static_cast<double>(project.ticks_per_frame);
+  const std::int32_t start = project.shots.front().start_frame;
+  const std::int32_t frames = project.end_frame - start;
+  const bool is_film = project.shots.size() > 1 || EndOf(project.shots.back()) < project.end_frame;
+  std::size_t bytes = 0;
+  for (const host::SavedShot& shot : project.shots) bytes += shot.effect.instance.size();
   if (json_) {
     nlohmann::ordered_json json;
     json["clip"] = clip.empty() ? project.clip_path : clip;
@@ -100,20 +105,38 @@ void InfoCommand::Run() {
     if (!trouble.empty()) json["trouble"] = trouble;
     json["width"] = project.width;
     json["height"] = project.height;
-    json["start_frame"] = project.start_frame;
-    json["frames"] = project.length;
+    json["start_frame"] = start;
+    json["frames"] = frames;
     json["rate"] = rate;
-    json["instance_bytes"] = project.effect.instance.size();
-    if (choice) json["choice"] = choice->Json();
+    json["instance_bytes"] = bytes;
+    nlohmann::ordered_json list = nlohmann::ordered_json::array();
+    for (const host::SavedShot& shot : project.shots) {
+      nlohmann::ordered_json told;
+      told["first_frame"] = shot.start_frame;
+      told["end_frame"] = EndOf(shot);
+      const auto choice = host::Choice::Parse(shot.choice);
+      if (choice) (is_film ? told : json)["choice"] = choice->Json();
+      list.push_back(told);
+    }
+    if (is_film) json["shots"] = list;
     std::printf("%s\n", JsonLine(json).c_str());
     return;
   }
   std::printf("%s: %d frames of %dx%d from %d, %.6g a second, %zu bytes of results\n",
-              clip.empty() ? project.clip_path.c_str() : clip.c_str(), project.length,
-              project.width, project.height, project.start_frame, rate,
-              project.effect.instance.size());
-  if (choice) {
-    std::printf("%s: %s\n", choice->Text().c_str(), choice->best().outcome.Text().c_str());
+              clip.empty() ? project.clip_path.c_str() : clip.c_str(), frames, project.width,
+              project.height, start, rate, bytes);
+  for (const host::SavedShot& shot : project.shots) {
+    const auto choice = host::Choice::Parse(shot.choice);
+    if (is_film) {
+      std::printf("frames %d to %d%s", shot.start_frame, EndOf(shot), choice ? ": " : "\n");
+    }
+    if (choice) {
+      std::printf("%s: %s\n", choice->Text().c_str(), choice->best().outcome.Text().c_str());
+    }
+  }
+  if (EndOf(project.shots.back()) < project.end_frame) {
+    std::printf("stopped there, %d frames before the end\n",
+                project.end_frame - EndOf(project.shots.back()));
   }
   std::printf("%s\n", trouble.empty() ? "the clip is the one that was analysed" : trouble.c_str());
 }
@@ -124,14 +147,15 @@ TracksCommand::TracksCommand(CLI::App& program)
                          "  calmframe tracks shaky.calm shaky.trk")) {
   AddFile(parser_, "PROJECT", project_, "The saved work");
   AddFile(parser_, "OUT", output_, "The track file, .trk");
+  AddShotFlag(parser_, shot_);
   AddSwitch(parser_, "--overwrite", overwrite_, "Replace OUT where it exists");
 }
 
 void TracksCommand::Run() {
   media::OutputFile file(output_, project_, overwrite_);
-  const std::unique_ptr<host::SteadyClip> clip = OpenSaved(project_);
-  KeepApart(output_, {clip->path()});
-  SaveTracks(*clip, project_, file.temporary(), output_);
+  const std::unique_ptr<host::Film> film = OpenSaved(project_);
+  KeepApart(output_, {film->whole().path});
+  SaveTracks(SavedShotOf(*film, project_, shot_), project_, file.temporary(), output_);
   file.Commit();
 }
 

@@ -18,7 +18,7 @@ class RenderCommand final : public Command {
 
  private:
   // Of the clip's frames. Throws UsageFailure where not all of them were worked.
-  media::FrameRange RangeOf(const host::SteadyClip& clip) const;
+  media::FrameRange RangeOf(const host::Film& film) const;
 
   std::string project_, output_;
   Stretch stretch_;
@@ -45,6 +45,7 @@ class TracksCommand final : public Command {
 
  private:
   std::string project_, output_;
+  int shot_ = 1;
   bool overwrite_ = false;
 };
 

@@ -31,12 +31,6 @@ std::filesystem::path PlaceOf(const std::string& path, std::error_code& error) {
   return error ? whole : std::filesystem::weakly_canonical(whole, error);
 }
 
-std::unique_ptr<host::SteadyClip> WithControls(std::unique_ptr<host::SteadyClip> clip,
-                                               const ControlFlags& controls) {
-  clip->SetControls(ResolveControls(controls, clip->host().declarations()));
-  return clip;
-}
-
 }  // namespace
 
 void AddProjectFlag(CLI::App& command, std::string& project) {
@@ -49,15 +43,13 @@ void AddProjectFlag(CLI::App& command, std::string& project) {
           Need::optional)});
 }
 
-std::unique_ptr<host::SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                         const ControlFlags& controls, host::Opening opening,
-                                         const Stretch& stretch) {
+std::unique_ptr<host::Film> TakeUp(const std::string& clip, const std::string& project,
+                                   host::Opening opening, const Stretch& stretch,
+                                   const host::ShotRequest& shots) {
   CheckOrder(stretch);
   std::error_code error;
   if (project.empty() || !std::filesystem::exists(project, error)) {
-    return WithControls(
-        std::make_unique<host::SteadyClip>(PluginPath(), clip, opening, PartFor(stretch)),
-        controls);
+    return std::make_unique<host::Film>(PluginPath(), clip, opening, PartFor(stretch), shots);
   }
   host::Project saved = host::LoadProject(project);
   if (host::ContentOf(clip) != saved.clip_content) {
@@ -65,19 +57,25 @@ std::unique_ptr<host::SteadyClip> TakeUp(const std::string& clip, const std::str
                          project + ": is of another clip, " + saved.clip_path);
   }
   KeepPlace(project, clip, saved);
-  auto taken = std::make_unique<host::SteadyClip>(PluginPath(), saved, clip);
+  auto taken = std::make_unique<host::Film>(PluginPath(), saved, clip, shots);
   if (stretch.is_given() && FramesOf(stretch, taken->whole()) != taken->range()) {
     throw UsageFailure(project + ": " + WorkedText(*taken) +
                        "; another stretch takes a project of its own, and a part of this one is "
                        "drawn by calmframe render");
   }
-  return WithControls(std::move(taken), controls);
+  return taken;
 }
 
-std::string WorkedText(const host::SteadyClip& clip) {
-  const media::FrameRange& worked = clip.range();
-  return "holds work from " + TimeText(clip.whole(), worked.first) + " to " +
-         TimeText(clip.whole(), worked.end) + " of the clip, frames " +
+host::SteadyClip* NextShot(host::Film& film, const ControlFlags& controls) {
+  host::SteadyClip* const shot = film.Next();
+  if (shot) shot->SetControls(ResolveControls(controls, shot->host().declarations()));
+  return shot;
+}
+
+std::string WorkedText(const host::Film& film) {
+  const media::FrameRange& worked = film.range();
+  return "holds work from " + TimeText(film.whole(), worked.first) + " to " +
+         TimeText(film.whole(), worked.end) + " of the clip, frames " +
          std::to_string(worked.first) + " to " + std::to_string(worked.end);
 }
 
@@ -87,10 +85,10 @@ std::string FindMovedClip(const std::string& path, host::Project& project) {
   return clip;
 }
 
-std::unique_ptr<host::SteadyClip> OpenSaved(const std::string& path, const ControlFlags& controls) {
+std::unique_ptr<host::Film> OpenSaved(const std::string& path, const host::ShotRequest& shots) {
   host::Project project = host::LoadProject(path);
   const std::string clip = FindMovedClip(path, project);
-  return WithControls(std::make_unique<host::SteadyClip>(PluginPath(), project, clip), controls);
+  return std::make_unique<host::Film>(PluginPath(), project, clip, shots);
 }
 
 void KeepApart(const std::string& output, const std::vector<std::string>& inputs,
@@ -113,18 +111,20 @@ void Unsaved::Throw() const {
   if (!line_.empty()) throw media::Failure(media::Failure::Side::output, line_);
 }
 
-Unsaved WorkAndLeave(host::SteadyClip& clip, const std::string& project, ProgressLine& progress) {
-  const host::Reuse reuse = clip.Work(progress);
+Unsaved WorkAndLeave(host::Film& film, host::SteadyClip& shot, const std::string& project,
+                     ProgressLine& progress) {
+  const host::Reuse reuse = shot.Work(progress);
   if (project.empty()) return Unsaved();
   if (const std::string text = reuse.Text(); !text.empty()) progress.Note(project + ": " + text);
-  if (reuse.framing && !clip.has_new_controls()) return Unsaved();
-  return Leave(clip, project);
+  if (reuse.framing && !shot.has_new_controls()) return Unsaved();
+  return Leave(film, project);
 }
 
-Unsaved Leave(host::SteadyClip& clip, const std::string& project) {
+Unsaved Leave(host::Film& film, const std::string& project) {
   if (project.empty()) return Unsaved();
+  film.Keep();
   try {
-    host::SaveProject(project, clip.Saved());
+    host::SaveProject(project, film.Saved());
   } catch (const host::ProjectFailure& failure) {
     return Unsaved(failure.what());
   }

@@ -9,6 +9,7 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/progress_line.h"
 #include "apps/calmframe/stretch.h"
+#include "host/stabilize/film.h"
 #include "host/stabilize/steady_clip.h"
 
 namespace calmframe {
@@ -19,9 +20,12 @@ void AddProjectFlag(CLI::App& command, std::string& project);
 // file; such a clip may not be read in order, so nothing is taken for promised. Throws
 // media::Failure when the work is of another clip, UsageFailure when it is of another stretch; one
 // that is not given is that of the work.
-std::unique_ptr<host::SteadyClip> TakeUp(const std::string& clip, const std::string& project,
-                                         const ControlFlags& controls, host::Opening opening,
-                                         const Stretch& stretch);
+std::unique_ptr<host::Film> TakeUp(const std::string& clip, const std::string& project,
+                                   host::Opening opening, const Stretch& stretch,
+                                   const host::ShotRequest& shots);
+
+// The film's next shot, with these controls.
+host::SteadyClip* NextShot(host::Film& film, const ControlFlags& controls);
 
 // Calls run(opening): by what the clip's container promises, which spares decoding it once more
 // than its analysis does, and where the frames break that from the start once more.
@@ -35,7 +39,7 @@ void RunOnPromises(const Run& run) {
 }
 
 // "holds work from 0:10 to 0:25 of the clip, frames 300 to 750", the end left out.
-std::string WorkedText(const host::SteadyClip& clip);
+std::string WorkedText(const host::Film& film);
 
 // Where the clip of saved work lies, which the work's file knows from now on. Throws as
 // host::FindClip.
@@ -43,8 +47,8 @@ std::string FindMovedClip(const std::string& path, host::Project& project);
 
 // The clip of saved work, found by its name or beside it. Throws media::Failure,
 // host::ProjectFailure.
-std::unique_ptr<host::SteadyClip> OpenSaved(const std::string& project,
-                                            const ControlFlags& controls = {});
+std::unique_ptr<host::Film> OpenSaved(const std::string& project,
+                                      const host::ShotRequest& shots = {});
 
 // Nothing of the user's is written over by a result of it: throws media::Failure (output) where
 // `output` is one of `inputs` under any name. Empty names stand for no file. `what` one of them is,
@@ -64,12 +68,12 @@ class Unsaved {
   std::string line_;
 };
 
-// Saves the clip's work. No project is an empty name.
-[[nodiscard]] Unsaved Leave(host::SteadyClip& clip, const std::string& project);
+// Saves the film's work, that of the open shot with it. No project is an empty name.
+[[nodiscard]] Unsaved Leave(host::Film& film, const std::string& project);
 
-// Does what is left to do, tells what was reused, and saves what is new. No project is an empty
-// name.
-[[nodiscard]] Unsaved WorkAndLeave(host::SteadyClip& clip, const std::string& project,
-                                   ProgressLine& progress);
+// Does what is left to do of a film's open shot, tells what was reused, and saves what is new. No
+// project is an empty name.
+[[nodiscard]] Unsaved WorkAndLeave(host::Film& film, host::SteadyClip& shot,
+                                   const std::string& project, ProgressLine& progress);
 
 }  // namespace calmframe

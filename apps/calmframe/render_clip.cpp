@@ -251,21 +251,24 @@ void TellLosses(const media::ClipWriter& writer, const SideBySide* both, Progres
 }
 
 void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
-                media::ClipWriter& writer, SideBySide* both, ProgressLine& progress) {
+                std::size_t at, bool last, media::ClipWriter& writer, SideBySide* both,
+                ProgressLine& progress) {
   RenderSettings own = settings;
   own.shots = both != nullptr;
+  const auto finish = [&] {
+    writer.Finish();
+    if (both) both->Finish();
+  };
   const std::vector<std::string> said = RenderFrames(
       clip, range, own, "rendering", progress,
       [&](std::size_t frame, const DrawnFrame& drawn) {
-        Write(writer, frame - range.first, *drawn.pixels);
-        if (both) both->Write(frame - range.first, *drawn.shot, *drawn.pixels);
+        const std::size_t to = frame - range.first + at;
+        Write(writer, to, *drawn.pixels);
+        if (both) both->Write(to, *drawn.shot, *drawn.pixels);
       },
-      [&] {
-        writer.Finish();
-        if (both) both->Finish();
-      });
+      last ? std::function<void()>(finish) : nullptr);
   for (const std::string& line : said) progress.Warn(line);
-  TellLosses(writer, both, progress);
+  if (last) TellLosses(writer, both, progress);
 }
 
 }  // namespace calmframe

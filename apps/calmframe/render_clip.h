@@ -53,9 +53,11 @@ void Write(media::ClipWriter& writer, std::size_t frame, const host::WorldBuffer
 // may be null.
 void TellLosses(const media::ClipWriter& writer, const SideBySide* both, ProgressLine& progress);
 
-// The same into a file, which is then whole, and into one of before and after, if there is such:
-// frames are counted from the range's first. What banners say, and the writers' warnings, are told.
+// The same into a file, and into one of before and after, if there is such: the range's first frame
+// becomes the output's frame `at`. With the last ones the files are whole. What banners say, and
+// the writers' warnings, are told.
 void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
-                media::ClipWriter& writer, SideBySide* both, ProgressLine& progress);
+                std::size_t at, bool last, media::ClipWriter& writer, SideBySide* both,
+                ProgressLine& progress);
 
 }  // namespace calmframe

@@ -9,6 +9,7 @@
 #include <utility>
 #include <vector>
 
+#include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/param_text.h"
 #include "apps/calmframe/plugin_path.h"
@@ -121,17 +122,17 @@ std::vector<double> Draw(host::SteadyClip& clip, int threads, ProgressLine& prog
   return empty;
 }
 
-// The clip of saved work, or where that is gone a stand-in for it, and a line that says so.
-std::unique_ptr<host::SteadyClip> OpenForReport(const std::string& path, std::string* gone) {
+// The film of saved work, or where its clip is gone a stand-in for it, and a line that says so.
+std::unique_ptr<host::Film> OpenForReport(const std::string& path, std::string* gone) {
   host::Project project = host::LoadProject(path);
   std::string clip;
   try {
     clip = FindMovedClip(path, project);
   } catch (const host::ProjectFailure& failure) {
     *gone = failure.what();
-    return std::make_unique<host::SteadyClip>(PluginPath(), project);
+    return std::make_unique<host::Film>(PluginPath(), project);
   }
-  return std::make_unique<host::SteadyClip>(PluginPath(), project, clip);
+  return std::make_unique<host::Film>(PluginPath(), project, clip);
 }
 
 std::string NameOf(const std::string& path) {
@@ -153,6 +154,7 @@ ReportCommand::ReportCommand(CLI::App& program)
           "  calmframe report shaky.calm report.html")) {
   AddFile(parser_, "PROJECT", project_, "The saved work");
   AddFile(parser_, "OUT", output_, "The page to write, .html");
+  AddShotFlag(parser_, shot_);
   AddWindowFlags(parser_, window_);
   PutInGroup("Output",
              {AddSwitch(parser_, "--overwrite", overwrite_, "Replace OUT where it exists")});
@@ -164,7 +166,8 @@ void ReportCommand::Run() {
   ProgressLine progress(run_.progress_form());
   media::OutputFile file(output_, project_, overwrite_);
   std::string gone;
-  const std::unique_ptr<host::SteadyClip> clip = OpenForReport(project_, &gone);
+  const std::unique_ptr<host::Film> film = OpenForReport(project_, &gone);
+  host::SteadyClip* const clip = &SavedShotOf(*film, project_, shot_);
   KeepApart(output_, {clip->path()});
   const media::ClipInfo& info = clip->info();
   const double rate =
@@ -180,6 +183,14 @@ void ReportCommand::Run() {
                      (info.frame_count == 1 ? " frame, " : " frames, ") +
                      report::Short(static_cast<double>(info.frame_count) / rate, 2) + " s" +
                      (info.cut ? ", from " + TimeText(clip->whole(), clip->range().first) : "")}};
+  if (film->Saved().shots.size() > 1) {
+    page.facts[1].name =
+        "Shot " + std::to_string(shot_) + " of " + std::to_string(film->Saved().shots.size());
+    const auto time = [&film](std::int32_t frame) {
+      return TimeText(film->whole(), static_cast<std::size_t>(std::max(frame, 0)));
+    };
+    report::AddShots(film->Saved().shots, film->number(), time, page);
+  }
   const auto note = [&](const std::string& line) {
     if (line.empty()) return;
     progress.Warn(line);
@@ -215,13 +226,13 @@ void ReportCommand::Run() {
     page.controls = ControlsOf(*clip);
     const std::size_t rows = std::max<std::size_t>(figures.tracked.size(), 1);
     page.seconds_a_value = static_cast<double>(info.frame_count) / rate / static_cast<double>(rows);
-    std::vector<report::FilmFrame> film = Moments(info);
+    std::vector<report::FilmFrame> moments = Moments(info);
     std::vector<std::string> said;
-    const std::vector<double> empty = Draw(*clip, run_.threads, progress, film, said);
+    const std::vector<double> empty = Draw(*clip, run_.threads, progress, moments, said);
     for (const std::string& line : said) {
       if (!nothing_seen) note(line);
     }
-    if (gone.empty()) page.film = std::move(film);
+    if (gone.empty()) page.film = std::move(moments);
     // Saved work doesn't keep how the models were chosen: a solve of the same tells it again. It
     // comes last, since tracks are saved in steps of 1/32 pixel, which moves its warps a little.
     std::vector<double> scores;

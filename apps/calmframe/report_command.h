@@ -18,6 +18,7 @@ class ReportCommand final : public Command {
 
  private:
   std::string project_, output_;
+  int shot_ = 1;
   bool overwrite_ = false;
   host::WindowSettings window_;
   RunFlags run_;

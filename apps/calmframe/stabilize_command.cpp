@@ -6,6 +6,7 @@
 #include <string>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
@@ -67,18 +68,6 @@ host::CropTrouble Choose(host::SteadyClip& clip, const host::WindowSettings& win
 
 void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressLine& progress) {
   TellTrouble(Choose(clip, window, progress), clip, progress);
-}
-
-void TellOutcome(host::SteadyClip& clip, ProgressLine& progress) {
-  if (!host::Crops(clip.ValueOf(HX_FRAMING.disk_id))) return;
-  const host::Outcome outcome = clip.Measure();
-  nlohmann::ordered_json object = outcome.Json();
-  std::string line = outcome.Text();
-  if (const host::Choice* choice = clip.choice()) {
-    object["choice"] = choice->Json();
-    line += "; " + choice->Text();
-  }
-  progress.End(line, object);
 }
 
 void AddRunFlags(CLI::App& command, RunFlags& flags) {
@@ -182,13 +171,12 @@ std::unique_ptr<SideBySide> MakeSideBySide(const OutputFlags& flags, const media
 }
 
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
-               const Stretch& stretch, const ControlFlags& controls, const OutputFlags& flags,
-               int threads, ProgressLine& progress) {
+               const Stretch& stretch, const host::ShotRequest& shots, const ControlFlags& controls,
+               const OutputFlags& flags, int threads, ProgressLine& progress) {
   const tessel::threads::ProcessorLimit limit(threads);
   RunOnPromises([&](host::Opening opening) {
-    const std::unique_ptr<host::SteadyClip> clip =
-        TakeUp(input, project, controls, opening, stretch);
-    const media::ClipInfo& info = clip->info();
+    const std::unique_ptr<host::Film> film = TakeUp(input, project, opening, stretch, shots);
+    const media::ClipInfo info = film->info();
     if (!info.warning.empty()) progress.Warn(info.warning);
     KeepApart(output, {project});
     // Made first, so that an output that cannot be written costs nobody an analysis.
@@ -196,14 +184,8 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
         media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
     const std::unique_ptr<SideBySide> both = MakeSideBySide(flags, info, output, {project});
     TellLosses(*writer, both.get(), progress);
-    Unsaved unsaved = WorkAndLeave(*clip, project, progress);
-    Frame(*clip, flags.window, progress);
-    if (clip->has_new_choice()) unsaved = Leave(*clip, project);
-    RenderClip(*clip, {0, info.frame_count}, SettingsOf(flags, threads), *writer, both.get(),
+    SteadyFilm(*film, film->range(), project, controls, flags, threads, *writer, both.get(),
                progress);
-    TellOutcome(*clip, progress);
-    unsaved.Throw();
-    if (both) both->Throw();
   });
 }
 
@@ -229,6 +211,7 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
           "f%04d.png or a folder with / for pictures");
   AddControlFlags(parser_, controls_);
   AddStretchFlags(parser_, stretch_, BareNumber::seconds);
+  AddShotsFlag(parser_, shots_);
   AddOutputFlags(parser_, flags_);
   AddSideBySideFlag(parser_, flags_);
   AddProjectFlag(parser_, project_);
@@ -237,7 +220,7 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
 
 void StabilizeCommand::Run() {
   ProgressLine progress(run_.progress_form());
-  Stabilize(input_, output_, project_, stretch_, controls_, flags_, run_.threads, progress);
+  Stabilize(input_, output_, project_, stretch_, shots_, controls_, flags_, run_.threads, progress);
 }
 
 }  // namespace calmframe

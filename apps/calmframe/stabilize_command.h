@@ -11,6 +11,7 @@
 #include "apps/calmframe/side_by_side.h"
 #include "apps/calmframe/stretch.h"
 #include "host/media/clip.h"
+#include "host/stabilize/film.h"
 #include "host/stabilize/framing.h"
 #include "host/stabilize/steady_clip.h"
 
@@ -55,8 +56,8 @@ RenderSettings SettingsOf(const OutputFlags& flags, int threads);
 // saved work is taken up, if it is there, and left; empty for none. Throws media::Failure,
 // UsageFailure, SolveFailure, host::ProjectFailure, Interrupted.
 void Stabilize(const std::string& input, const std::string& output, const std::string& project,
-               const Stretch& stretch, const ControlFlags& controls, const OutputFlags& flags,
-               int threads, ProgressLine& progress);
+               const Stretch& stretch, const host::ShotRequest& shots, const ControlFlags& controls,
+               const OutputFlags& flags, int threads, ProgressLine& progress);
 
 // One line, with the flags that help; empty where all is well.
 std::string TroubleText(const host::CropTrouble& trouble, const host::SteadyClip& clip);
@@ -73,9 +74,6 @@ void TellTrouble(const host::CropTrouble& trouble, const host::SteadyClip& clip,
 // The same, and tells what there is to tell of that, by TellTrouble.
 void Frame(host::SteadyClip& clip, const host::WindowSettings& window, ProgressLine& progress);
 
-// What came out of it, behind all else that a run says.
-void TellOutcome(host::SteadyClip& clip, ProgressLine& progress);
-
 // `calmframe stabilize IN OUT`. Added to the program's parser; runs when that has chosen it.
 class StabilizeCommand final : public Command {
  public:
@@ -87,6 +85,7 @@ class StabilizeCommand final : public Command {
  private:
   std::string input_, output_, project_;
   Stretch stretch_;
+  host::ShotRequest shots_;
   ControlFlags controls_;
   OutputFlags flags_;
   RunFlags run_;

@@ -52,6 +52,25 @@ std::optional<double> ClockSeconds(std::string_view text) {
   return seconds;
 }
 
+CLI::Option* AddMoment(CLI::App& command, const std::string& flag, std::optional<Moment>& moment,
+                       BareNumber bare, const std::string& description) {
+  return command
+      .add_option_function<std::string>(
+          flag, [&moment, bare](const std::string& text) { moment = MomentOf(text, bare); },
+          description)
+      ->check([bare](const std::string& text) { return MomentTrouble(text, bare); })
+      ->take_last()
+      ->type_name("TIME");
+}
+
+[[noreturn]] void FailForOrder(const Stretch& stretch) {
+  throw UsageFailure("--to " + stretch.to->text + " must lie behind " +
+                     (stretch.from ? "--from " + stretch.from->text : "the clip's first frame") +
+                     ", by a frame at least");
+}
+
+}  // namespace
+
 std::optional<Moment> MomentOf(const std::string& text, BareNumber bare) {
   Moment moment{text};
   std::string_view number = text;
@@ -71,22 +90,12 @@ std::optional<Moment> MomentOf(const std::string& text, BareNumber bare) {
   return moment;
 }
 
-CLI::Option* AddMoment(CLI::App& command, const std::string& flag, std::optional<Moment>& moment,
-                       BareNumber bare, const std::string& description) {
-  const auto check = [bare](const std::string& text) -> std::string {
-    if (MomentOf(text, bare)) return "";
-    if (text.size() > 1 && text[0] == '-' && MomentOf(text.substr(1), bare)) {
-      return text + " is out of range: 0 or more";
-    }
-    return "'" + text + "' is no time such as 12.5, 1:30 or 0:01:30.5, and no frame such as 300f";
-  };
-  return command
-      .add_option_function<std::string>(
-          flag, [&moment, bare](const std::string& text) { moment = MomentOf(text, bare); },
-          description)
-      ->check(check)
-      ->take_last()
-      ->type_name("TIME");
+std::string MomentTrouble(const std::string& text, BareNumber bare) {
+  if (MomentOf(text, bare)) return "";
+  if (text.size() > 1 && text[0] == '-' && MomentOf(text.substr(1), bare)) {
+    return text + " is out of range: 0 or more";
+  }
+  return "'" + text + "' is no time such as 12.5, 1:30 or 0:01:30.5, and no frame such as 300f";
 }
 
 double SecondsAt(const media::ClipInfo& clip, std::size_t frame) {
@@ -101,7 +110,6 @@ double SecondsAt(const media::ClipInfo& clip, std::size_t frame) {
          static_cast<double>(clip.time_base.den);
 }
 
-// The first frame that begins to be shown at the moment or later; the clip's end where none does.
 std::size_t FrameAt(const Moment& moment, const media::ClipInfo& clip) {
   if (moment.is_frame) return static_cast<std::size_t>(moment.value);
   std::size_t first = 0, end = clip.frame_count;
@@ -115,14 +123,6 @@ std::size_t FrameAt(const Moment& moment, const media::ClipInfo& clip) {
   }
   return first;
 }
-
-[[noreturn]] void FailForOrder(const Stretch& stretch) {
-  throw UsageFailure("--to " + stretch.to->text + " must lie behind " +
-                     (stretch.from ? "--from " + stretch.from->text : "the clip's first frame") +
-                     ", by a frame at least");
-}
-
-}  // namespace
 
 void AddStretchFlags(CLI::App& command, Stretch& stretch, BareNumber bare) {
   const std::string forms = bare == BareNumber::frame

@@ -16,14 +16,23 @@ struct Moment {
   double value = 0;  // frames or seconds
 };
 
+// What a whole number without a unit stands for.
+enum class BareNumber { seconds, frame };
+
+// As the flags of a stretch take it; none of what is no moment.
+std::optional<Moment> MomentOf(const std::string& text, BareNumber bare);
+// Why a text is no moment, in words; empty of one.
+std::string MomentTrouble(const std::string& text, BareNumber bare);
+// The first frame that begins to be shown at the moment or later; the clip's end where none does.
+std::size_t FrameAt(const Moment& moment, const media::ClipInfo& clip);
+// When a frame, or the clip's end, is shown: seconds from the first frame.
+double SecondsAt(const media::ClipInfo& clip, std::size_t frame);
+
 // The frames from one moment to another; without any all that there are.
 struct Stretch {
   std::optional<Moment> from, to;
   bool is_given() const { return from || to; }
 };
-
-// What a whole number without a unit stands for.
-enum class BareNumber { seconds, frame };
 
 // Adds --from and --to. Times are seconds ("12.5", "12s"), "M:SS" or "H:MM:SS", both with a
 // fraction where need be; a frame is "300f".

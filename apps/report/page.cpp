@@ -60,6 +60,9 @@ svg .name.marked { font-weight: 600; }
 .ways tbody tr:first-child > * { border-top: 1px solid var(--line); }
 .ways .taken > * { color: var(--ink); font-weight: 600; background: rgb(0 114 178 / 10%); }
 .ways mark { background: var(--c1); color: var(--card); border-radius: 9px; padding: 1px 8px; margin-left: 8px; font-size: 12px; font-weight: 400; }
+.strip { display: flex; gap: 1px; height: 22px; overflow: hidden; }
+.strip i { flex-basis: 0; min-width: 1px; border-radius: 3px; background: var(--c0); opacity: .45; }
+.strip .here { background: var(--c1); opacity: 1; }
 .film { display: grid; grid-template-columns: repeat(auto-fill, minmax(min(300px, 46%), 1fr)); gap: 14px; }
 .film figure { padding: 8px; margin: 0; }
 .film div { position: relative; margin-top: 4px; }
@@ -132,26 +135,38 @@ std::string FigureOf(const Plot& plot, double seconds_a_value) {
   return html + SvgOf(plot, seconds_a_value) + "</figure>\n";
 }
 
-std::string TableOf(const Shown::Ways& ways) {
+std::string TableOf(const MarkedTable& table) {
   std::string html = "<div class=\"wide\"><table class=\"ways\">\n<thead><tr>";
-  for (const std::string& column : ways.columns) {
+  for (const std::string& column : table.columns) {
     html += "<th scope=\"col\">" + Escaped(column) + "</th>";
   }
   html += "</tr></thead>\n<tbody>\n";
-  for (std::size_t r = 0; r < ways.rows.size(); ++r) {
-    const bool taken = r == ways.taken;
-    html += taken ? "<tr class=\"taken\">" : "<tr>";
-    for (std::size_t c = 0; c < ways.rows[r].size(); ++c) {
-      const std::string cell = Escaped(ways.rows[r][c]);
+  for (std::size_t r = 0; r < table.rows.size(); ++r) {
+    const bool marked = r == table.marked;
+    html += marked ? "<tr class=\"taken\">" : "<tr>";
+    for (std::size_t c = 0; c < table.rows[r].size(); ++c) {
+      const std::string cell = Escaped(table.rows[r][c]);
       if (c > 0) {
         html += "<td>" + cell + "</td>";
         continue;
       }
-      html += "<th scope=\"row\">" + cell + (taken ? "<mark>chosen</mark>" : "") + "</th>";
+      html += "<th scope=\"row\">" + cell +
+              (marked ? "<mark>" + Escaped(table.mark) + "</mark>" : "") + "</th>";
     }
     html += "</tr>\n";
   }
   return html + "</tbody>\n</table></div>\n";
+}
+
+std::string SectionOf(const Shots& shots) {
+  std::string html = "<h2>Shots</h2>\n<div class=\"strip\">";
+  for (std::size_t s = 0; s < shots.lengths.size(); ++s) {
+    const auto& row = shots.table.rows[s];
+    html += std::string("<i") + (s == shots.table.marked ? " class=\"here\"" : "") +
+            " style=\"flex-grow: " + Short(shots.lengths[s], 3) + "\" title=\"" +
+            Escaped(row.size() > 1 ? row[0] + ", from " + row[1] : row[0]) + "\"></i>";
+  }
+  return html + "</div>\n" + TableOf(shots.table);
 }
 
 std::string SectionOf(const Shown& shown) {
@@ -224,6 +239,7 @@ std::string HtmlOf(const Page& page) {
   }
   html += "<section class=\"cards\">\n" + TableOf("In figures", page.facts) +
           TableOf("Controls", page.controls) + "</section>\n";
+  if (!page.shots.table.rows.empty()) html += SectionOf(page.shots);
   if (!page.shown.words.empty()) html += SectionOf(page.shown);
   if (!page.film.empty()) {
     html += "<h2>Before and after</h2>\n<section class=\"film\">\n";

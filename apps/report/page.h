@@ -19,15 +19,25 @@ struct FilmFrame {
   std::string before, after;
 };
 
+// Rows of which one stands out.
+struct MarkedTable {
+  std::vector<std::string> columns;
+  std::vector<std::vector<std::string>> rows;  // a cell a column
+  std::size_t marked = 0;                      // of the rows
+  std::string mark;                            // what that one is, a word or two
+};
+
 // What was chosen of the clip to show.
 struct Shown {
   std::vector<std::string> words;  // a paragraph each; none: the page doesn't tell of it
-  struct Ways {                    // those that were tried, a row each
-    std::vector<std::string> columns;
-    std::vector<std::vector<std::string>> rows;  // a cell a column; none: no table and no dots
-    std::size_t taken = 0;                       // of the rows
-  } ways;
+  MarkedTable ways;                // those that were tried; no rows: no table and no dots
   Scatter scatter;
+};
+
+// The shots of a film, of which the page shows the marked one; no rows: it is none.
+struct Shots {
+  std::vector<double> lengths;  // of each, in any unit
+  MarkedTable table;            // a row each
 };
 
 struct Page {
@@ -36,6 +46,7 @@ struct Page {
   std::vector<Fact> facts;         // of the clip and what became of it
   std::vector<Fact> controls;      // that it was made with
   std::vector<std::string> notes;  // what the reader should know, a sentence each
+  Shots shots;
   Shown shown;
   std::string plots_about;  // what holds for several of the plots
   std::vector<Plot> plots;

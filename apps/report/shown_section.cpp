@@ -47,6 +47,31 @@ std::string MeaningText(const host::Choice& choice) {
 
 }  // namespace
 
+void AddShots(const std::vector<host::SavedShot>& shots, std::size_t shown,
+              const std::function<std::string(std::int32_t frame)>& time, Page& page) {
+  page.shots.table.columns = {"Shot",         "From",        "To",
+                              "Frames",       "Width kept",  "Greatest zoom",
+                              "Shake before", "Shake after", "Chosen"};
+  page.shots.table.marked = shown;
+  page.shots.table.mark = "this page";
+  for (std::size_t s = 0; s < shots.size(); ++s) {
+    const host::SavedShot& shot = shots[s];
+    page.shots.lengths.push_back(shot.length);
+    std::vector<std::string> row = {"shot " + std::to_string(s + 1), time(shot.start_frame),
+                                    time(shot.start_frame + shot.length),
+                                    std::to_string(shot.length)};
+    if (const auto choice = host::Choice::Parse(shot.choice)) {
+      const host::Outcome& outcome = choice->best().outcome;
+      row.insert(row.end(), {Fixed(100 * outcome.width_kept, 1) + " %", Fixed(outcome.most_zoom, 2),
+                             Fixed(outcome.before.mean, 2), Fixed(outcome.after.mean, 2),
+                             choice->best().name});
+    } else {
+      row.resize(page.shots.table.columns.size());
+    }
+    page.shots.table.rows.push_back(std::move(row));
+  }
+}
+
 void AddChoice(const host::Choice& choice, Page& page) {
   const host::Outcome& outcome = choice.best().outcome;
   const bool follows = choice.best().follows;
@@ -66,10 +91,11 @@ void AddChoice(const host::Choice& choice, Page& page) {
   if (choice.candidates.size() < 2) return;
   page.shown.words.push_back(RuleText());
   page.shown.words.push_back(MeaningText(choice));
-  Shown::Ways& ways = page.shown.ways;
+  MarkedTable& ways = page.shown.ways;
   ways.columns = {"Way",   "Width kept",      "Greatest zoom", "Black at most",
                   "Shake", "Shake of tracks", "Wobble",        "Cost, dB"};
-  ways.taken = choice.taken;
+  ways.marked = choice.taken;
+  ways.mark = "chosen";
   page.shown.scatter = {"ways",
                         "Shake against width",
                         "width kept, %",

@@ -88,6 +88,37 @@ Outcome Outcome::Parse(const nlohmann::json& object) {
   return outcome;
 }
 
+Outcome OutcomeOf(const std::vector<ShotOutcome>& shots) {
+  double frames = 0;
+  for (const ShotOutcome& shot : shots) frames += static_cast<double>(shot.frames);
+  Outcome film;
+  film.window = Outcome::Window::none;
+  film.bends = false;
+  film.width_kept = 0;
+  for (const ShotOutcome& shot : shots) {
+    const Outcome& own = shot.outcome;
+    if (own.window == Outcome::Window::follow || film.window == Outcome::Window::none) {
+      film.window = own.window;
+    }
+    film.bends = film.bends || own.bends;
+    film.most_zoom = std::max(film.most_zoom, own.most_zoom);
+    film.most_black = std::max(film.most_black, own.most_black);
+    if (own.after.worst >= film.after.worst) {
+      film.after.worst = own.after.worst;
+      film.after.worst_at = shot.begins + own.after.worst_at;
+    }
+    const double share = static_cast<double>(shot.frames) / frames;
+    film.width_kept += share * own.width_kept;
+    film.before.mean += share * own.before.mean;
+    film.after.mean += share * own.after.mean;
+    film.tracks_before += share * own.tracks_before;
+    film.tracks_after += share * own.tracks_after;
+    film.wobble_before += share * own.wobble_before;
+    film.wobble_after += share * own.wobble_after;
+  }
+  return film;
+}
+
 Outcome MeasureOutcome(const ShownMotion& source, const ShownMotion& shown,
                        double frames_per_second) {
   Outcome outcome;

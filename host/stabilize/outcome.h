@@ -1,8 +1,10 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <nlohmann/json_fwd.hpp>
 #include <string>
+#include <vector>
 
 #include "host/stabilize/follow_windows.h"
 
@@ -31,6 +33,16 @@ struct Outcome {
   // and std::invalid_argument for a window that there is not.
   static Outcome Parse(const nlohmann::json& object);
 };
+
+// What a shot of a film shows.
+struct ShotOutcome {
+  Outcome outcome;
+  double begins = 0;       // seconds from the film's first frame
+  std::size_t frames = 0;  // 1 at least
+};
+// Of the film as a whole, of one shot at least: means weighed by frames, the greatest zoom and
+// black, the worst moment of all.
+Outcome OutcomeOf(const std::vector<ShotOutcome>& shots);
 
 // `source`: see MotionOfSource.
 Outcome MeasureOutcome(const ShownMotion& source, const ShownMotion& shown,

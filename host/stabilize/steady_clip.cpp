@@ -91,16 +91,12 @@ std::string FailureText(int status, const std::vector<std::string>& messages) {
 }
 
 // A layer may reach beyond its clip.
-media::FrameRange RangeOf(const Project& project, const media::ClipInfo& clip) {
+media::FrameRange RangeOf(const SavedShot& shot, const media::ClipInfo& clip) {
   const auto count = static_cast<std::int64_t>(clip.frame_count);
-  const std::int64_t first = std::clamp<std::int64_t>(project.start_frame, 0, count - 1);
-  const std::int64_t end = std::clamp<std::int64_t>(
-      std::int64_t{project.start_frame} + project.length, first + 1, count);
+  const std::int64_t first = std::clamp<std::int64_t>(shot.start_frame, 0, count - 1);
+  const std::int64_t end =
+      std::clamp<std::int64_t>(std::int64_t{shot.start_frame} + shot.length, first + 1, count);
   return {static_cast<std::size_t>(first), static_cast<std::size_t>(end)};
-}
-
-media::FrameRange RangeOf(const media::ClipReader::Part& part, const media::ClipInfo& clip) {
-  return part ? part(clip) : media::FrameRange{0, clip.frame_count};
 }
 
 // Shows nothing to a watcher who may stop the work all the same.
@@ -124,24 +120,23 @@ std::string Reuse::Text() const {
                  : "reused the analysis and the solve";
 }
 
-SteadyClip::Medium SteadyClip::Open(const std::string& path,
-                                    std::unique_ptr<media::ClipReader> reader) {
+ClipMedium MediumOf(std::unique_ptr<media::ClipReader> reader) {
   const media::ClipInfo info = reader->info();
   if (info.width < kLeastSide || info.height < kLeastSide) {
-    throw media::Failure(media::Failure::Side::input, path + ": " + std::to_string(info.width) +
-                                                          " by " + std::to_string(info.height) +
-                                                          " pixels are too few to stabilize");
+    throw media::Failure(media::Failure::Side::input,
+                         info.path + ": " + std::to_string(info.width) + " by " +
+                             std::to_string(info.height) + " pixels are too few to stabilize");
   }
   const std::shared_ptr<const media::FoundFrames> frames = reader->found();
-  return {info, OpenClip(std::move(reader)), frames};
+  return {info, OpenClip(std::move(reader)), frames, info.frame_count};
 }
 
-SteadyClip::Medium SteadyClip::Blank(const Project& project) {
+ClipMedium StandInFor(const Project& project) {
   SourceInfo source;
   source.width = std::max(project.width, 1);
   source.height = std::max(project.height, 1);
   source.pixel_aspect = project.pixel_aspect;
-  source.frame_count = std::int64_t{project.start_frame} + project.length;
+  source.frame_count = std::int64_t{project.shots.back().start_frame} + project.shots.back().length;
   source.ticks_per_frame = project.ticks_per_frame;
   source.field_type = project.field_type;
   source.content = project.clip_content;
@@ -157,55 +152,56 @@ SteadyClip::Medium SteadyClip::Blank(const Project& project) {
   const auto draw = [](std::int64_t, Picture& picture) {
     std::memset(picture.memory(), 0xff, picture.bytes());
   };
-  return {info, MakeDrawnSource(source, draw), nullptr};
+  return {info, MakeDrawnSource(source, draw), nullptr, info.frame_count};
 }
 
-SteadyClip::SteadyClip(const std::string& plugin, const std::string& path, Opening opening,
-                       const media::ClipReader::Part& part)
-    : SteadyClip(
-          plugin,
-          Open(path, opening == Opening::promised ? media::ClipReader::OpenPromised(path, part)
-                                                  : media::ClipReader::Open(path)),
-          part) {}
+SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium,
+                       const media::FrameRange& range)
+    : SteadyClip(plugin, medium, nullptr, nullptr, range) {}
 
-SteadyClip::SteadyClip(const std::string& plugin, const Medium& medium,
-                       const media::ClipReader::Part& part)
-    : SteadyClip(plugin, nullptr, medium, RangeOf(part, medium.info)) {}
+SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium, const Project& project,
+                       std::size_t shot)
+    : SteadyClip(plugin, medium, &project, &project.shots.at(shot),
+                 RangeOf(project.shots.at(shot), medium.info)) {}
 
-SteadyClip::SteadyClip(const std::string& plugin, const Project& project, const Medium& medium)
-    : SteadyClip(plugin, &project, medium, RangeOf(project, medium.info)) {}
-
-SteadyClip::SteadyClip(const std::string& plugin, const Project& project, const std::string& path)
-    : SteadyClip(plugin, project, Open(path, media::ClipReader::Open(path, project.clip_frames))) {}
-
-SteadyClip::SteadyClip(const std::string& plugin, const Project& project)
-    : SteadyClip(plugin, project, Blank(project)) {}
-
-SteadyClip::SteadyClip(const std::string& plugin, const Project* project, const Medium& medium,
-                       const media::FrameRange& range) try
+SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium, const Project* project,
+                       const SavedShot* shot, const media::FrameRange& range) try
     : whole_(medium.info),
       range_(range),
       info_(media::PartOf(whole_, range_)),
+      end_(medium.end),
       found_(medium.found),
       host_(plugin, SettingsFor(info_)),
       session_(host_) {
   const auto layer = boost::make_shared<Layer>(medium.source);
   layer->Change([&](LayerState& state) {
     state.name = state.file_name = path();
-    state.start_frame = project ? project->start_frame : static_cast<std::int32_t>(range_.first);
-    state.length = project ? project->length : static_cast<std::int32_t>(range_.size());
+    state.start_frame = shot ? shot->start_frame : static_cast<std::int32_t>(range_.first);
+    state.length = shot ? shot->length : static_cast<std::int32_t>(range_.size());
     if (!project) return;
     state.ticks_per_frame = project->ticks_per_frame;
     state.field_type = project->field_type;
   });
-  effect_ = project ? &session_.Load(layer, project->effect) : &session_.Apply(layer);
+  effect_ = shot ? &session_.Load(layer, shot->effect) : &session_.Apply(layer);
   if (!effect_->creation().ok()) throw SolveFailure(effect_->creation().Line(path()));
   // Saved work keeps what it was made with.
-  if (!project) Set(HX_TRANSITION_BISQUARE_SIGMA.disk_id, kTransitionBisquareSigma);
-  if (project) choice_ = Choice::Parse(project->choice);
+  if (!shot) Set(HX_TRANSITION_BISQUARE_SIGMA.disk_id, kTransitionBisquareSigma);
+  if (shot) choice_ = Choice::Parse(shot->choice);
   if (choice_) held_ = choice_->still;
 } catch (const PluginError& error) {
   throw SolveFailure(error.what());
+}
+
+void SteadyClip::EndWithShot() {
+  const auto layer = effect_->shared()->layer();
+  const std::int64_t end =
+      layer->state()->source->EndOfShot(static_cast<std::int64_t>(range_.first));
+  if (end >= static_cast<std::int64_t>(range_.end)) return;
+  range_.end = static_cast<std::size_t>(end);
+  info_ = media::PartOf(whole_, range_);
+  layer->Change([this](LayerState& state) {
+    state.length = static_cast<std::int32_t>(range_.end) - state.start_frame;
+  });
 }
 
 void SteadyClip::SetControls(const ParamValues& values) {
@@ -215,6 +211,15 @@ void SteadyClip::SetControls(const ParamValues& values) {
     set_.insert(disk_id);
   }
   has_new_controls_ = has_new_controls_ || !values.empty();
+}
+
+void SteadyClip::TakeControls(const ParamValues& values) {
+  for (const HX_ParamDef& declared : host_.declarations()) {
+    const auto given = values.find(declared.disk_id);
+    // What is hidden is the effect's own, such as its status.
+    if (given == values.end() || (declared.ui_flags & HX_PARAM_UI_HIDDEN) != 0) continue;
+    if (ValueOf(declared.disk_id) != given->second) Set(declared.disk_id, given->second);
+  }
 }
 
 void SteadyClip::UndoChoice() {
@@ -247,6 +252,7 @@ void SteadyClip::Settle(Watcher& watcher, Progress& shown, Reuse& reuse) {
   bool has_new_tracks = false;
   const auto show = [&] {
     const Work work = Session::WorkOf(*effect_);
+    EndWithShot();
     const std::uint64_t delivered = host_.media().counts().delivered;
     if (IsBroken()) return true;  // in this order: what it ends for that reason is not told
     const std::string stage = work == Work::analysing ? "analyzing"
@@ -342,8 +348,10 @@ Reuse SteadyClip::WorkFramedLast(double framing, Watcher& watcher) {
     if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
     Settle(watcher, shown, reuse);
   }
-  // An analysis that ended early has not seen all that was promised.
-  if (found_ && found_->standing() != media::Standing::decoded) throw BrokenPromise();
+  // An analysis that ended early has not seen all that was promised; a shot before the last is to.
+  if (found_ && range_.end == end_ && found_->standing() != media::Standing::decoded) {
+    throw BrokenPromise();
+  }
   reuse.solve = reuse.analysis && warp && warp == FirstWarp();
   if (!reuse.solve && FirstWarp()) TakeAsSaved();
   if (Crops(framing) && Session::StatusOf(*effect_) == kReady) {
@@ -624,26 +632,18 @@ double SteadyClip::Zoom(const SolvedClip& solved) const {
   return additional * std::max(1.0, std::min(fills, ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100));
 }
 
-Project SteadyClip::Saved() {
-  Project project;
+SavedShot SteadyClip::Saved() {
+  SavedShot shot;
   host_.KeepAnalysisRaw(false);
-  const CommandResult saved = effect_->Save(&project.effect);
+  const CommandResult saved = effect_->Save(&shot.effect);
   host_.KeepAnalysisRaw(true);
   if (!saved.ok()) throw SolveFailure(saved.Line(path()));
   const auto layer = effect_->shared()->layer()->state();
-  project.clip_path = path();
-  project.clip_content = layer->source->info().content;
-  if (found_) project.clip_frames = found_->Bytes();
-  project.width = info_.width;
-  project.height = info_.height;
-  project.pixel_aspect = layer->source->info().pixel_aspect;
-  project.start_frame = layer->start_frame;
-  project.length = layer->length;
-  project.ticks_per_frame = layer->ticks_per_frame;
-  project.field_type = layer->field_type;
-  if (choice_) project.choice = choice_->Json().dump();
+  shot.start_frame = layer->start_frame;
+  shot.length = layer->length;
+  if (choice_) shot.choice = choice_->Json().dump();
   has_new_choice_ = false;
-  return project;
+  return shot;
 }
 
 const void* SteadyClip::FirstWarp() {

@@ -47,23 +47,37 @@ struct FollowRequest {
   Still still = Still::automatic;
 };
 
-// A clip on the timeline of a host, with the effect applied to it: opened, worked, framed, measured
-// and saved. For the thread that made it; one at a time in a process, as its host is.
+// A clip that is open.
+struct ClipMedium {
+  media::ClipInfo info;
+  SourcePtr source;
+  std::shared_ptr<const media::FoundFrames> found;  // null: a stand-in for one that is gone
+  std::size_t end = 0;  // behind the last frame that is to be worked of it
+};
+
+// Throws media::Failure where the frames are too small to be stabilized.
+ClipMedium MediumOf(std::unique_ptr<media::ClipReader> reader);
+// What stands for the clip of saved work that is gone: blank frames.
+ClipMedium StandInFor(const Project& project);
+
+// A clip, or a shot of one, on the timeline of a host, with the effect applied to it: worked,
+// framed, measured and saved. For the thread that made it; one at a time in a process, as its host
+// is.
 class SteadyClip {
  public:
-  // `plugin`: the effect's library. A clip of which nothing is done yet, or with a `part` these
-  // frames of it alone; or the saved work of one, with its own part. Throws media::Failure,
-  // SolveFailure when the effect can't be had, and what `part` throws.
-  SteadyClip(const std::string& plugin, const std::string& path, Opening opening = Opening::decoded,
-             const media::ClipReader::Part& part = {});
-  SteadyClip(const std::string& plugin, const Project& project, const std::string& path);
-  // The saved work of a clip that is gone: what was made of it stands, its frames are blank.
-  SteadyClip(const std::string& plugin, const Project& project);
+  // `plugin`: the effect's library. These frames of a clip, of which nothing is done yet, or as far
+  // as the medium's source finds them to be of one shot; or the saved work of one of the project's
+  // shots. Throws SolveFailure when the effect can't be had.
+  SteadyClip(const std::string& plugin, const ClipMedium& medium, const media::FrameRange& range);
+  SteadyClip(const std::string& plugin, const ClipMedium& medium, const Project& project,
+             std::size_t shot);
 
   // Sets these of the effect's parameters; host().declarations() has them all. What they ask for is
   // there after the next Work; what was chosen beside the controls before is undone. Throws
   // SolveFailure.
   void SetControls(const ParamValues& values);
+  // The controls of other saved work, before any Work; none of them counts as set.
+  void TakeControls(const ParamValues& values);
   // The controls again as they were given, before any choice, and all tracks; what they ask for is
   // there after the next Work. False where that is what there is. Throws SolveFailure.
   bool ForgetChoice();
@@ -72,7 +86,8 @@ class SteadyClip {
   // As a clip of its own: a part, where only a stretch of it is worked.
   const media::ClipInfo& info() const { return info_; }
   const media::ClipInfo& whole() const { return whole_; }
-  // What is worked, in frames of the whole clip.
+  // What is worked, in frames of the whole clip. Where the source finds that another shot begins in
+  // it, it ends there as soon as that is known, after Work at the latest.
   const media::FrameRange& range() const { return range_; }
   Host& host() { return host_; }
   // Since it was opened.
@@ -111,7 +126,7 @@ class SteadyClip {
   ShownPath Path();
 
   // Throws SolveFailure where the effect can't be saved.
-  Project Saved();
+  SavedShot Saved();
   // After Work: what is solved, as it would be saved. Throws SolveFailure.
   SolvedClip Solved();
 
@@ -128,17 +143,10 @@ class SteadyClip {
   void CheckMedia();
 
  private:
-  struct Medium {
-    media::ClipInfo info;
-    SourcePtr source;
-    std::shared_ptr<const media::FoundFrames> found;  // null: a stand-in for one that is gone
-  };
-  static Medium Open(const std::string& path, std::unique_ptr<media::ClipReader> reader);
-  static Medium Blank(const Project& project);
-  SteadyClip(const std::string& plugin, const Medium& medium, const media::ClipReader::Part& part);
-  SteadyClip(const std::string& plugin, const Project& project, const Medium& medium);
-  SteadyClip(const std::string& plugin, const Project* project, const Medium& medium,
-             const media::FrameRange& range);
+  SteadyClip(const std::string& plugin, const ClipMedium& medium, const Project* project,
+             const SavedShot* shot, const media::FrameRange& range);
+  // Ends where the source sees the shot end by now.
+  void EndWithShot();
   bool IsBroken() const;
   Reuse WorkFramedLast(double framing, Watcher& watcher);
   // act(the parameter's value); what act throws leaves it with that value.
@@ -179,8 +187,9 @@ class SteadyClip {
   const void* FirstWarp();
 
   const media::ClipInfo whole_;
-  const media::FrameRange range_;
-  const media::ClipInfo info_;
+  media::FrameRange range_;
+  media::ClipInfo info_;
+  const std::size_t end_;                                  // of the medium
   const std::shared_ptr<const media::FoundFrames> found_;  // null of a stand-in
   Host host_;
   Session session_;

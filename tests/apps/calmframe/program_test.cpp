@@ -522,6 +522,47 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
 }
 
 // Saved tracks and warps are rounded; a run that saves nothing draws from the same.
+// Two streets behind each other, with sound.
+TEST_F(ProgramTest, AFilmComesOutAsItsShotsDoAlone) {
+  WriteStreet(Path("a.mkv"), Made(160, 120, 24, 25), 1);
+  WriteStreet(Path("b.mkv"), Made(160, 120, 30, 25), 5);
+  const auto ffmpeg = [this](const std::string& arguments) {
+    ASSERT_EQ(Shell("cd '" + path().string() + "' && ffmpeg -v error " + arguments).code, 0);
+  };
+  ffmpeg(
+      "-i a.mkv -i b.mkv -f lavfi -i sine=d=2.16 -filter_complex '[0:v][1:v]concat=n=2:v=1[v]' "
+      "-map '[v]' -map 2:a -c:v ffv1 -c:a flac -r 25 film.mkv");
+  ffmpeg("-i film.mkv -vf trim=end_frame=24 -an -c:v ffv1 first.mkv");
+  ffmpeg("-i film.mkv -vf trim=start_frame=24,setpts=PTS-STARTPTS -an -c:v ffv1 second.mkv");
+  EXPECT_EQ(RunWell("shots film.mkv --quiet"),
+            "1  0:00 to 0:00.96  frames 0 to 24  start\n"
+            "2  0:00.96 to 0:02.16  frames 24 to 54  cut\n");
+  const std::string lossless = " --codec ffv1 --overwrite ";
+  EXPECT_THAT(RunWell("stabilize film.mkv out.mkv --project p.calm" + lossless),
+              HasSubstr("calmframe: 2 shots: "));
+  RunWell("render --project p.calm --quiet part.mkv --from 20 --to 28" + lossless);
+  RunWell("stabilize first.mkv steady0.mkv --quiet" + lossless);
+  RunWell("stabilize second.mkv steady1.mkv --quiet" + lossless);
+  const auto out = ClipReader::Open(Path("out.mkv")), part = ClipReader::Open(Path("part.mkv"));
+  const auto first = ClipReader::Open(Path("steady0.mkv"));
+  const auto second = ClipReader::Open(Path("steady1.mkv"));
+  ASSERT_EQ(out->info().frame_count, 54u);
+  EXPECT_EQ(out->info().times, ClipReader::Open(Path("film.mkv"))->info().times);
+  for (std::size_t f = 0; f < 54; ++f) {
+    const auto frame = ReadFrame(*out, f);
+    EXPECT_TRUE(SamePixels(frame, f < 24 ? ReadFrame(*first, f) : ReadFrame(*second, f - 24))) << f;
+    if (f >= 20 && f < 28) {
+      EXPECT_TRUE(SamePixels(frame, ReadFrame(*part, f - 20))) << f;
+    }
+  }
+  for (const char* clip : {"film.mkv", "out.mkv"}) {
+    ffmpeg(std::string("-i ") + clip + " -map 0:a -f md5 " + clip + ".md5");
+  }
+  EXPECT_EQ(Content("film.mkv.md5"), Content("out.mkv.md5"));
+  ExpectLine("stabilize film.mkv x.mkv --shots 0:01,0:03", 2, "--shots 0:03 lies behind the last");
+  ExpectLine("tracks p.calm x.trk --shot 3", 2, "p.calm: has 2 shots");
+}
+
 TEST_F(ProgramTest, APictureIsTheSameThroughAProjectOrWithout) {
   MakeClip("in.mp4", 160, 120, 40);
   const auto drawn = [this](const std::string& flags) {

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "host/stabilize/failures.h"
+#include "host/stabilize/film.h"
 #include "platform/hx/hx_controls.h"
 #include "tests/support/drawn_clip.h"
 #include "tests/support/scratch_folder.h"
@@ -49,11 +50,13 @@ TEST_F(SteadyClipTest, FromAClipToWhatItShowsAndBack) {
   Onlooker onlooker;
   Project saved;
   {
-    SteadyClip clip(CALMFRAME_PLUGIN, path_);
+    Film film(CALMFRAME_PLUGIN, path_);
+    SteadyClip& clip = *film.Next();
     clip.SetControls({{HX_SMOOTHNESS.disk_id, 80}});
     EXPECT_EQ(clip.Work(onlooker).Text(), "");
     EXPECT_EQ(onlooker.stages, (Texts{"analyzing", "solving"}));
-    saved = clip.Saved();
+    film.Keep();
+    saved = film.Saved();
     const Outcome own = clip.Measure();
     EXPECT_EQ(own.window, Outcome::Window::steady);
     EXPECT_LT(own.after.mean, own.before.mean / 2);
@@ -72,7 +75,8 @@ TEST_F(SteadyClipTest, FromAClipToWhatItShowsAndBack) {
     EXPECT_EQ(clip.Measure().window, Outcome::Window::steady);
     EXPECT_GT(clip.Measure().after.mean, own.after.mean);
   }
-  SteadyClip again(CALMFRAME_PLUGIN, saved, path_);
+  Film film(CALMFRAME_PLUGIN, saved, path_);
+  SteadyClip& again = *film.Next();
   EXPECT_EQ(again.Work(onlooker).Text(), "reused the analysis, the solve and the framing");
   EXPECT_EQ(again.ValueOf(HX_SMOOTHNESS.disk_id), 80);
 }
@@ -82,18 +86,21 @@ TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
   Project saved;
   std::string chosen;
   {
-    SteadyClip clip(CALMFRAME_PLUGIN, path_);
+    Film film(CALMFRAME_PLUGIN, path_);
+    SteadyClip& clip = *film.Next();
     clip.Work(onlooker);
     clip.FollowPicture({}, onlooker);
     EXPECT_EQ(onlooker.stages.back(), "choosing");
     chosen = clip.choice()->Json().dump();
     EXPECT_EQ(clip.choice()->candidates[0].name, "as set");
     EXPECT_GE(clip.choice()->candidates.size(), 3u);
-    saved = clip.Saved();
-    EXPECT_EQ(saved.choice, chosen);
+    film.Keep();
+    saved = film.Saved();
+    EXPECT_EQ(saved.shots.at(0).choice, chosen);
   }
   {
-    SteadyClip again(CALMFRAME_PLUGIN, saved, path_);
+    Film film(CALMFRAME_PLUGIN, saved, path_);
+    SteadyClip& again = *film.Next();
     again.Work(later);
     again.FollowPicture({}, later);
     EXPECT_EQ(later.stages, Texts{}) << "nothing is solved or chosen";
@@ -108,15 +115,17 @@ TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
   auto made = nlohmann::json::parse(chosen);
   made["given"]["20"] = 50;
   for (auto& candidate : made["candidates"]) candidate["changes"]["20"] = 80;
-  saved.effect.values[HX_SMOOTHNESS.disk_id] = 80;
-  saved.choice = made.dump();
+  saved.shots[0].effect.values[HX_SMOOTHNESS.disk_id] = 80;
+  saved.shots[0].choice = made.dump();
   {
-    SteadyClip again(CALMFRAME_PLUGIN, saved, path_);
+    Film film(CALMFRAME_PLUGIN, saved, path_);
+    SteadyClip& again = *film.Next();
     again.Work(later);
     again.FollowPicture({.zoom_speed = 0}, later);
     EXPECT_NE(again.ValueOf(HX_SMOOTHNESS.disk_id), 80) << "as does another request";
   }
-  SteadyClip clip(CALMFRAME_PLUGIN, saved, path_);
+  Film film(CALMFRAME_PLUGIN, saved, path_);
+  SteadyClip& clip = *film.Next();
   clip.SetControls({{HX_METHOD.disk_id, 2}});
   EXPECT_EQ(clip.ValueOf(HX_SMOOTHNESS.disk_id), 50);
   EXPECT_EQ(clip.choice(), nullptr);
@@ -130,7 +139,8 @@ TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
 TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {
   std::vector<Point> expected;
   for (const char* stage : {"", "analyzing", "solving"}) {
-    SteadyClip clip(CALMFRAME_PLUGIN, path_);
+    Film film(CALMFRAME_PLUGIN, path_);
+    SteadyClip& clip = *film.Next();
     Onlooker hasty(stage), patient;
     if (*stage) {
       EXPECT_THROW(clip.Work(hasty), Interrupted) << stage;

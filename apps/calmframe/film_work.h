@@ -1,0 +1,46 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "apps/calmframe/controls.h"
+#include "apps/calmframe/stabilize_command.h"
+#include "host/stabilize/film.h"
+
+namespace calmframe {
+
+// Adds --shots.
+void AddShotsFlag(CLI::App& command, host::ShotRequest& shots);
+
+// Adds --shot, of one of saved work's, counted from 1.
+void AddShotFlag(CLI::App& command, int& shot);
+// Opens that one. Throws UsageFailure where there is none.
+host::SteadyClip& SavedShotOf(host::Film& film, const std::string& project, int shot);
+
+// What a film's shots show, told behind all else that a run says.
+class FilmOutcome {
+ public:
+  explicit FilmOutcome(const host::Film& film) : film_(film) {}
+  // Of the film's open shot, after it was framed.
+  void Add(host::SteadyClip& shot);
+  void Tell(ProgressLine& progress) const;
+
+ private:
+  struct Told {
+    media::FrameRange range;
+    host::ShotOutcome outcome;
+    std::string line;
+    nlohmann::ordered_json object;
+  };
+  const host::Film& film_;
+  std::vector<Told> shots_;
+};
+
+// Works, frames and draws the film shot by shot, those that have frames of `part`, which is of the
+// whole clip and goes to the writers. `project`: where the work is left; empty for none. Throws
+// SolveFailure, media::Failure, UsageFailure, Interrupted, BrokenPromise.
+void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::string& project,
+                const ControlFlags& controls, const OutputFlags& flags, int threads,
+                media::ClipWriter& writer, SideBySide* both, ProgressLine& progress);
+
+}  // namespace calmframe
