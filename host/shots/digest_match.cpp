@@ -15,7 +15,8 @@ using Area = FrameDigest::Area;
 constexpr int kHalfColumns = FrameDigest::kHalfColumns, kHalfRows = FrameDigest::kHalfRows;
 
 // A variance of cells, in 255ths squared, that says nothing: what noise and a coder leave.
-constexpr double kNoise = 4;
+// Of a mean of four cells it leaves less.
+constexpr double kNoise = 4, kHalfNoise = 1;
 
 Area Intersection(const Area& a, const Area& b) {
   return {std::max(a.left, b.left), std::max(a.top, b.top), std::min(a.right, b.right),
@@ -94,9 +95,10 @@ struct HalfMatch {
   double correlation = -2;
 };
 
-// The best of the shifts about a middle one that leave at least `least` of the area.
+// The best of the shifts about a middle one that leave at least `least` of the area. `noise`: a
+// variance that says nothing.
 HalfMatch BestShift(const FrameDigest& a, const FrameDigest& b, const Area& area, CellShift middle,
-                    int reach_x, int reach_y, double least) {
+                    int reach_x, int reach_y, double least, double noise) {
   const AreaSums a_sums(a.half), b_sums(b.half);
   HalfMatch best;
   for (int y = middle.y - reach_y; y <= middle.y + reach_y; ++y) {
@@ -111,7 +113,7 @@ HalfMatch BestShift(const FrameDigest& a, const FrameDigest& b, const Area& area
                       1.0 * a_sums.Squares(in_a),
                       1.0 * b_sums.Squares(in_b),
                       1.0 * Products<kHalfColumns>(a.half.data(), b.half.data(), in_a, shift)};
-      const double correlation = m.cov() / std::sqrt((m.var_a() + kNoise) * (m.var_b() + kNoise));
+      const double correlation = m.cov() / std::sqrt((m.var_a() + noise) * (m.var_b() + noise));
       if (correlation > best.correlation) best = {shift, correlation};
     }
   }
@@ -250,7 +252,7 @@ DigestMatch MatchOf(const FrameDigest& first, const FrameDigest& second) {
   const Area half = HalfOf(area);
   // Less than two fifths of a frame fit too easily.
   const HalfMatch whole = BestShift(first, second, half, {}, (half.right - half.left) / 2,
-                                    (half.bottom - half.top) / 2, 0.4);
+                                    (half.bottom - half.top) / 2, 0.4, kNoise);
   const CellShift shift{2 * whole.shift.x, 2 * whole.shift.y};
   const DigestMatch match = BlocksAbout(first, second, area, shift);
   // A title that comes or goes may draw the shift to itself where the picture repeats.
@@ -345,9 +347,8 @@ Mixture Fit(const FrameDigest& a, const FrameDigest& frame, const FrameDigest& b
   const auto centred = [n](std::int32_t product, std::int32_t x, std::int32_t y) {
     return (product - 1.0 * x * y / n) / n;
   };
-  // A variance of 1 more is what rounding and noise leave of a mean of four.
-  const double vaa = centred(aa, sa, sa) + 1, vbb = centred(bb, sb, sb) + 1;
-  const double vff = centred(ff, sf, sf) + 1, vab = centred(ab, sa, sb);
+  const double vaa = centred(aa, sa, sa) + kHalfNoise, vbb = centred(bb, sb, sb) + kHalfNoise;
+  const double vff = centred(ff, sf, sf) + kHalfNoise, vab = centred(ab, sa, sb);
   const double vaf = centred(af, sa, sf), vbf = centred(bf, sb, sf);
   const double determinant = vaa * vbb - vab * vab;
   Mixture m;
@@ -359,29 +360,41 @@ Mixture Fit(const FrameDigest& a, const FrameDigest& frame, const FrameDigest& b
   return m;
 }
 
+double LeftBy(const HalfMatch& match) {
+  const double c = std::max(0.0, match.correlation);
+  return 1 - c * c;
+}
+
 int Halved(int cells) {
   return cells >= 0 ? (cells + 1) / 2 : -((1 - cells) / 2);
 }
 
+HalfMatch PlaceAlone(const FrameDigest& first, const FrameDigest& second, const Area& area,
+                     CellShift about) {
+  // How far the sums of rounded shifts may be off, in cells of `half`.
+  constexpr int kReachX = 5, kReachY = 4;
+  return BestShift(first, second, area, {Halved(about.x), Halved(about.y)}, kReachX, kReachY, 0.5,
+                   kHalfNoise);
+}
+
 }  // namespace
+
+std::optional<double> LeftAlone(const FrameDigest& first, const FrameDigest& second,
+                                CellShift second_from_first) {
+  const Area area = HalfOf(SharedArea(first, second));
+  const HalfMatch match = PlaceAlone(first, second, area, second_from_first);
+  if (match.correlation < -1) return {};
+  return LeftBy(match);
+}
 
 std::optional<Mixture> MixtureOf(const FrameDigest& a, const FrameDigest& frame,
                                  const FrameDigest& b, CellShift frame_from_a,
                                  CellShift frame_from_b, double worth) {
-  // How far the sums of rounded shifts may be off, in cells of `half`.
-  constexpr int kReachX = 5, kReachY = 4;
-  constexpr double kLeast = 0.5;
   const Area area = HalfOf(SharedArea(a, b));
-  const HalfMatch alone_a = BestShift(
-      a, frame, area, {Halved(frame_from_a.x), Halved(frame_from_a.y)}, kReachX, kReachY, kLeast);
-  const HalfMatch alone_b = BestShift(
-      b, frame, area, {Halved(frame_from_b.x), Halved(frame_from_b.y)}, kReachX, kReachY, kLeast);
+  const HalfMatch alone_a = PlaceAlone(a, frame, area, frame_from_a);
+  const HalfMatch alone_b = PlaceAlone(b, frame, area, frame_from_b);
   if (alone_a.correlation < -1 || alone_b.correlation < -1) return {};
-  const auto left = [](const HalfMatch& match) {
-    const double c = std::max(0.0, match.correlation);
-    return 1 - c * c;
-  };
-  if (left(alone_a) < worth || left(alone_b) < worth) return {};
+  if (LeftBy(alone_a) < worth || LeftBy(alone_b) < worth) return {};
   // One and then the other moves to its best place beside the other (coordinate descent).
   CellShift places[2] = {alone_a.shift, alone_b.shift};
   constexpr double kLeastOfBoth = 0.3;
@@ -404,8 +417,8 @@ std::optional<Mixture> MixtureOf(const FrameDigest& a, const FrameDigest& frame,
     }
     if (!moved) break;
   }
-  best.first_left = left(alone_a);
-  best.second_left = left(alone_b);
+  best.first_left = LeftBy(alone_a);
+  best.second_left = LeftBy(alone_b);
   return best;
 }
 

@@ -43,6 +43,12 @@ DigestMatch MatchOf(const FrameDigest& first, const FrameDigest& second);
 double DifferenceButForLight(const FrameDigest& first, const FrameDigest& second,
                              const DigestMatch& match);
 
+// What the first frame leaves of the second's contrast at its best place, about the one that the
+// motion from frame to frame gives: a share of its square, 0 to 1. None where they share less than
+// half of the frame.
+std::optional<double> LeftAlone(const FrameDigest& first, const FrameDigest& second,
+                                CellShift second_from_first);
+
 // A frame as first_weight * A + second_weight * B + an offset, by least squares over where both
 // lie, each at its best place. What is left over is a share of the frame's contrast, 0 to 1.
 struct Mixture {

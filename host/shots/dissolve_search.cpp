@@ -19,18 +19,19 @@ constexpr double kAlone = 0.06;
 constexpr double kLeft = 0.4, kLeftOfShortest = 0.25;
 // The weights' sum: light may change a little on the way.
 constexpr double kSum[2] = {0.7, 1.3};
+constexpr double kSureSum[2] = {0.8, 1.15};  // of those that tell where it begins and ends
 // The share of the frame behind: in the middle the mixture tells most.
 constexpr double kShare[2] = {0.25, 0.75};
 // By how much it grows over each half of the way, at least; a third to a half it should be.
 constexpr double kGrowth = 0.08;
 // Strength, see HitAt: the sum over a dissolve's frames times the greatest. Outside of dissolves
-// 0.16 at most, over a pan across a repeated pattern; less in two of 24 dissolves between similar
+// 0.09 at most, over a pan across a repeated pattern; less in two of 24 dissolves between similar
 // places, in none between others.
-constexpr double kStrong = 0.18;
+constexpr double kStrong = 0.12;
 constexpr double kWeak = 0.06;  // is still a part of a dissolve
 
 // Of what either frame alone leaves: so much can be seen well.
-constexpr double kFull = 0.2;
+constexpr double kFull = 0.4;
 // How far beyond the frames that are surely in a dissolve its ends are looked for, in steps.
 constexpr std::int64_t kBeyond = 22;
 constexpr double kSure = 0.25;  // of the strength of the best
@@ -69,7 +70,7 @@ struct Span {
 Span BestSpan(const std::vector<Triple>& triples, std::int64_t count, std::int64_t first_sure,
               std::int64_t last_sure) {
   constexpr double kMost = 0.2 * 0.2;
-  constexpr double kLeastChange = 0.1;
+  constexpr double kLeastChange = 0.18;  // of the share, below which it can't be parted
   Span best;
   double least = 1e30;
   for (std::int64_t before = 0; before < first_sure; ++before) {
@@ -78,7 +79,7 @@ Span BestSpan(const std::vector<Triple>& triples, std::int64_t count, std::int64
       for (const Triple& t : triples) {
         const double at_first = ShareIn(t.first, before, behind);
         const double change = ShareIn(t.last, before, behind) - at_first;
-        double miss = kMost;
+        double miss = kMost / 2;
         if (change > kLeastChange) {
           const double off = t.share - (ShareIn(t.middle, before, behind) - at_first) / change;
           miss = std::min(kMost, off * off);
@@ -191,9 +192,11 @@ std::optional<ShotBorder> DissolveSearch::BorderOf(const FrameHistory& history) 
       const double alone = std::max(m->first_left, m->second_left);
       const double sum = m->first_weight + m->second_weight;
       const std::int64_t at = (a - first) / step_;
-      if (!(m->left < kLeft * alone && alone > kAlone && sum > kSum[0] && sum < kSum[1])) continue;
+      if (!(m->left < kLeft * alone && alone > kAlone && sum > kSureSum[0] && sum < kSureSum[1])) {
+        continue;
+      }
       triples.push_back({at, at + width, at + 2 * width, std::clamp(ShareOf(*m), 0.0, 1.0),
-                         std::min(1.0, alone / kFull)});
+                         std::min(1.0, alone * alone / (kFull * kFull))});
     }
   }
   const Span span = BestSpan(triples, (end - first + step_ - 1) / step_,
