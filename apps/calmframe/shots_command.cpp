@@ -67,7 +67,8 @@ void ShotsCommand::Run() {
   const media::FrameRange range = FramesOf(stretch_, clip);
   const std::vector<host::ListedShot> shots =
       Listed(host::FindShots(medium, range, progress), range, clip);
-  const host::ListedFilm film{std::filesystem::path(input_).filename(), clip.frame_rate.num, clip.frame_rate.den};
+  const host::ListedFilm film{std::filesystem::path(input_).filename(), clip.frame_rate.num,
+                              clip.frame_rate.den};
   if (form_ == "csv" || form_ == "edl") {
     std::fputs((form_ == "csv" ? host::CsvOf(film, shots) : host::EdlOf(film, shots)).c_str(),
                stdout);

@@ -249,8 +249,7 @@ constexpr HX_StabilizerHostSuite7 kStabilizerHost = {SetFramePolygon};
 HX_Err GetEnd(HX_EffectRef effect, std::int32_t* frame) {
   return Tell("Analysis Span.GetEnd", effect, frame, [](TimelineEffect&, const LayerState& layer) {
     constexpr std::int64_t kMost = std::numeric_limits<std::int32_t>::max();
-    return static_cast<std::int32_t>(
-        std::min(layer.source->EndOfShot(layer.start_frame), kMost));
+    return static_cast<std::int32_t>(std::min(layer.source->EndOfShot(layer.start_frame), kMost));
   });
 }
 

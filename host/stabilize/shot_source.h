@@ -37,7 +37,7 @@ class ShotSource final : public Source {
   const bool looks_;
   mutable std::mutex mutex_;  // guards all below
   ShotFinder finder_;
-  std::int64_t next_;                           // frame that the finder is to have
+  std::int64_t next_;                            // frame that the finder is to have
   std::map<std::int64_t, FrameDigest> waiting_;  // behind it
   std::vector<ShotBorder> borders_;
 };
