@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstdlib>
 
+#include "host/stabilize/seams.h"
 #include "host/stabilize/window/clip_windows.h"
 
 namespace calmframe::host {
@@ -59,14 +60,13 @@ Regions Seen(const Regions& regions, const Similarity& window) {
 // Where a motion puts a frame of that size; empty where it is none.
 std::vector<HalfPlane> RegionOf(const SolvedClip::Neighbour& neighbour, double width, double height,
                                 double rim) {
-  const auto& m = neighbour.plane_from_frame;
+  const Matrix& m = neighbour.plane_from_frame;
   std::array<Point, 4> corners;
   for (std::size_t i = 0; i < corners.size(); ++i) {
     const double x = i % 2 == 0 ? 0 : width - 1, y = i < 2 ? 0 : height - 1;
-    const double w = m[6] * x + m[7] * y + m[8];
-    if (!(w > 0)) return {};
-    corners[i] = {(m[0] * x + m[1] * y + m[2]) / w - (width - 1) / 2,
-                  (m[3] * x + m[4] * y + m[5]) / w - (height - 1) / 2};
+    if (!(m[6] * x + m[7] * y + m[8] > 0)) return {};
+    const Point at = Apply(m, {x, y});
+    corners[i] = {at.x - (width - 1) / 2, at.y - (height - 1) / 2};
   }
   return CoveredRegion({corners.data(), 2, 2}, rim);
 }
@@ -92,10 +92,31 @@ FilledPlane::FilledPlane(const WarpedPlane& plane, const Filling& filling)
   for (std::size_t f = 0; f < covered_.size(); ++f) {
     add(covered_[f], CoveredRegion(plane.Warp(f), filling.rim));
   }
-  for (const SolvedClip::Neighbour& neighbour : NeighboursIn(plane.clip(), plane.warps())) {
-    if (std::abs(neighbour.frame - neighbour.in) > filling.reach) continue;
-    add(covered_[static_cast<std::size_t>(neighbour.in)],
-        RegionOf(neighbour, width_, height_, filling.rim));
+  fits_ = covered_;
+  std::vector<SolvedClip::Neighbour> neighbours = NeighboursIn(plane.clip(), plane.warps());
+  const auto away = [](const auto& neighbour) { return std::abs(neighbour.frame - neighbour.in); };
+  std::stable_sort(neighbours.begin(), neighbours.end(),
+                   [&](const auto& a, const auto& b) { return away(a) < away(b); });
+  const Seams seams(plane);
+  struct Torn {
+    std::array<bool, 4> before{}, after{};
+  };
+  std::vector<Torn> torn(covered_.size());
+  for (const SolvedClip::Neighbour& neighbour : neighbours) {
+    if (away(neighbour) > filling.reach) continue;
+    const auto in = static_cast<std::size_t>(neighbour.in);
+    std::vector<HalfPlane> region = RegionOf(neighbour, width_, height_, filling.rim);
+    add(covered_[in], region);
+    const std::vector<HalfPlane> own = CoveredRegion(plane.Warp(in), filling.rim);
+    if (region.empty() || own.empty()) continue;
+    // What lies behind one that is torn, further away, is hardly seen.
+    auto& of_side = neighbour.frame < neighbour.in ? torn[in].before : torn[in].after;
+    const std::array<bool, 4> by_this = seams.TornBy(neighbour);
+    for (std::size_t side = 0; side < own.size(); ++side) {
+      of_side[side] = of_side[side] || by_this[side];
+      if (of_side[side]) region.push_back(own[side]);
+    }
+    add(fits_[in], std::move(region));
   }
 }
 
@@ -106,7 +127,7 @@ std::vector<HalfPlane> FilledPlane::RegionAround(std::size_t frame,
   constexpr int kSteps = 33;
   const double step = width_ / 200;
   const double scale = std::hypot(window.a, window.b);
-  const Regions regions = Seen(covered_[frame], window);
+  const Regions regions = Seen(fits_[frame], window);
   // What rounding puts outside of a region is none of its faults.
   constexpr double kRounding = 1e-3;
   Box box{-scale * width_ / 2 + kRounding, -scale * height_ / 2 + kRounding,

@@ -28,9 +28,9 @@ class FilledPlane {
   FilledPlane(const WarpedPlane& plane, const Filling& filling);
 
   // Four half-planes, along the sides of the part of the plane that a window shows, as far outside
-  // of it as all that lies between is covered; by no more than a sixth of its width. Empty where
-  // the window itself isn't covered. `window`: takes points of an output of the clip's size, about
-  // its middle, to the plane.
+  // of it as all that lies between is covered by what isn't torn off; see Seams. By no more than a
+  // sixth of its width. Empty where the window itself isn't covered so. `window`: takes points of
+  // an output of the clip's size, about its middle, to the plane.
   std::vector<HalfPlane> RegionAround(std::size_t frame, const Similarity& window) const;
   // Share of the output that nothing covers, 0 to 1; too much by some thousandths at most.
   double UncoveredShare(std::size_t frame, const Similarity& window) const;
@@ -40,7 +40,8 @@ class FilledPlane {
   using Region = std::vector<HalfPlane>;
 
   const double width_, height_;
-  std::vector<std::vector<Region>> covered_;  // by frame: itself, where it has a place, and others
+  // By frame: itself, where it has a place, and others; of these all, and what isn't torn off.
+  std::vector<std::vector<Region>> covered_, fits_;
 };
 
 }  // namespace calmframe::host

@@ -48,6 +48,11 @@ Point Apply(const Homography& h, Point p) {
   return {(h[0] * p.x + h[1] * p.y + h[2]) / w, (h[3] * p.x + h[4] * p.y + h[5]) / w};
 }
 
+Point Apply(const Matrix& m, Point p) {
+  const double w = m[6] * p.x + m[7] * p.y + m[8];
+  return {(m[0] * p.x + m[1] * p.y + m[2]) / w, (m[3] * p.x + m[4] * p.y + m[5]) / w};
+}
+
 Homography FitHomography(const std::vector<Point>& from, const std::vector<Point>& to,
                          const Homography& start, double farthest) {
   Homography h = start;

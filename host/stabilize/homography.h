@@ -18,6 +18,7 @@ using Matrix = std::array<double, 9>;
 Matrix Product(const Matrix& then, const Matrix& first);
 
 Point Apply(const Homography& h, Point p);
+Point Apply(const Matrix& m, Point p);
 
 // That which takes points of `from` to those of `to` (equally many), best in the mean of squares
 // that are weighted by what they are divided by (the direct linear transform: Hartley and
