@@ -20,11 +20,11 @@ Matrix Product(const Matrix& then, const Matrix& first);
 Point Apply(const Homography& h, Point p);
 Point Apply(const Matrix& m, Point p);
 
-// That which takes points of `from` to those of `to` (equally many), best in the mean of squares
-// that are weighted by what they are divided by (the direct linear transform: Hartley and
-// Zisserman, Multiple View Geometry, 2nd ed., ch. 4). Points that leave it by `farthest` or more
-// don't count, nearer ones the more, beginning with `start`, which is also what it stays where too
-// few are left. Coordinates about 1 in size; what the points leave open of a tilt is none.
+// That which takes points of `from` to those of `to` (equally many) with the least sum of squared
+// algebraic errors (the direct linear transform: Hartley and Zisserman, Multiple View Geometry, 2nd
+// ed., ch. 4). Points that it leaves `farthest` or more away don't count, nearer ones the more, by
+// Tukey's bisquare, in rounds that begin with `start`; that it is where too few are left. For
+// coordinates about 1 in size. What the points leave open of a tilt is none.
 Homography FitHomography(const std::vector<Point>& from, const std::vector<Point>& to,
                          const Homography& start,
                          double farthest = std::numeric_limits<double>::infinity());
