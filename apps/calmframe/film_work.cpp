@@ -111,7 +111,8 @@ host::SteadyClip& SavedShotOf(host::Film& film, const std::string& project, int 
 
 void FilmOutcome::Add(host::SteadyClip& shot) {
   Told told{shot.range(), {}, "", nlohmann::ordered_json::object()};
-  if (host::Crops(shot.ValueOf(HX_FRAMING.disk_id))) {
+  // That leaves what it leaves.
+  if (shot.ValueOf(HX_FRAMING.disk_id) != host::kStabilizeOnly) {
     told.outcome.outcome = shot.Measure();
     told.object = told.outcome.outcome.Json();
     told.line = told.outcome.outcome.Text();

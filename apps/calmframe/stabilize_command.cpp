@@ -62,7 +62,8 @@ host::CropTrouble Choose(host::SteadyClip& clip, const host::WindowSettings& win
     return host::ChooseFraming(clip, window, progress);
   } catch (const host::WindowRefused&) {
     throw UsageFailure(
-        "a window that follows the picture needs --framing crop-auto-scale and no margin");
+        "a window that follows the picture needs --framing crop-auto-scale or synthesize-edges, "
+        "and no margin");
   }
 }
 
@@ -93,8 +94,8 @@ void AddWindowFlags(CLI::App& command, host::WindowSettings& window) {
       {"follow", "steady"},
       "What of each frame is shown: a part that follows the picture, which leaves nothing black "
       "and enlarges no further than it may; or the effect's own window. At first the one that "
-      "follows, "
-      "unless --smoothness, --crop-less-smooth-more, --result or --framing are set");
+      "follows, unless --smoothness, --crop-less-smooth-more or --result are set; --framing crop "
+      "and stabilize-only have the effect's own alone");
   CLI::Option* const zoom = AddNumber<double>(
       command, "--zoom-at-most", [&window](double most) { window.most_zoom = most; }, "ZOOM", 1,
       100, "How far a window that follows may enlarge; at first as far as --maximum-scale, 1.5");

@@ -120,7 +120,7 @@ void AddWindows(const host::ShownPath& path, Page& page) {
   using host::Point;
   const auto add = [&](const char* id, const char* title, const char* about, double Point::*axis) {
     Curve curve{"centre", {}};
-    Band band{"within the picture", {}, {}};
+    Band band{"within the frame", {}, {}};
     for (const host::WindowPlace& place : path.windows) {
       curve.values.push_back(place.centre.*axis);
       band.least.push_back(place.least.*axis);
@@ -130,7 +130,7 @@ void AddWindows(const host::ShownPath& path, Page& page) {
   };
   add("window-x", "Window, across",
       "Where the centre of what is shown lies, to the right of the frame's; shaded as far as it "
-      "may go, at its size, within the picture.",
+      "may go, at its size, within the frame.",
       &Point::x);
   add("window-y", "Window, down", "The same downwards.", &Point::y);
   const std::vector<double>& zooms = path.output.zooms;

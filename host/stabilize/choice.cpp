@@ -190,8 +190,9 @@ bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_be
       [&](std::size_t i) {
         Candidate& at = tries[i];
         windows[i] = WindowsOf(at, plane, motion);
-        at.outcome = MeasureOutcome(as_filmed_, MotionShown(plane, motion, windows[i]),
-                                    settings_.frames_per_second);
+        at.outcome =
+            MeasureOutcome(as_filmed_, MotionShown(plane, motion, windows[i], settings_.filling),
+                           settings_.frames_per_second);
         at.outcome.window = Outcome::Window::follow;
         at.outcome.bends = at.warps == Warps::solved;
         at.cost = CostOf(at);

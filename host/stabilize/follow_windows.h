@@ -1,7 +1,9 @@
 #pragma once
 
+#include <optional>
 #include <vector>
 
+#include "host/stabilize/filled_plane.h"
 #include "host/stabilize/measures.h"
 #include "host/stabilize/picture_motion.h"
 #include "host/stabilize/solved_clip.h"
@@ -19,25 +21,30 @@ struct FollowSettings {
   double zoom_speed = 5;
   double frames_per_second = 30;  // above 0; fields, of an interlaced clip
   WindowWeights weights = {};
+  std::optional<Filling> filling = {};  // of a framing that fills the edges
 };
 
 // For each frame the part of the stabilized plane that the output shows, as WithWindows takes it:
 // the calmest windows that stay where the frame's warp puts the picture, and below the zoom; see
-// FindWindowPath. A frame whose warp is folded counts as one that fills the plane's corner.
+// FindWindowPath. A frame whose warp is folded counts as one that fills the plane's corner. Where
+// the edges are filled, the windows stay where the picture is once they are: from those that stay
+// in the frames on, each round finds the calmest in the parts of the plane that are covered around
+// those before.
 std::vector<Similarity> FollowWindows(const WarpedPlane& plane, const PictureMotion& motion,
                                       const FollowSettings& settings);
 
-// What the effect shows by itself: its own crop windows, enlarged `zoom` times; without a crop
-// windows in the plane's corner, where a frame lies that is not warped.
+// What the effect shows by itself: its own crop windows, enlarged `zoom` times; without a crop the
+// middle of the bounds of all frames, to a pixel.
 std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom);
 
 // The whole frame where it lies that is not warped, but for a hundredth of a pixel along its edges:
 // there what is drawn rounds to the frame or beside it.
 std::vector<Similarity> WholeFrames(const SolvedClip& clip);
 
-// What these windows show. `motion`: that of the plane.
+// What these windows show, with the edges filled or not. `motion`: that of the plane.
 ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
-                        const std::vector<Similarity>& windows);
+                        const std::vector<Similarity>& windows,
+                        const std::optional<Filling>& filling = {});
 // What the source shows. `motion`: without warps.
 ShownMotion MotionOfSource(const SolvedClip& clip, const PictureMotion& motion);
 

@@ -51,7 +51,8 @@ CropTrouble CropTroubleOf(SteadyClip& clip) {
 bool Follows(SteadyClip& clip, const WindowSettings& settings) {
   using Kind = WindowSettings::Kind;
   const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };
-  const bool may_follow = value(HX_FRAMING) == kCropAutoScale &&
+  const double framing = value(HX_FRAMING);
+  const bool may_follow = (framing == kCropAutoScale || framing == kSynthesizeEdges) &&
                           value(HX_ACTION_SAFE_MARGIN) == 0 && value(HX_ADDITIONAL_SCALE) > 0;
   // Whoever sets how calm the path is has it so, as far as the effect goes.
   const bool as_it_comes =
@@ -63,7 +64,8 @@ bool Follows(SteadyClip& clip, const WindowSettings& settings) {
   const bool asked = settings.kind == Kind::follow || settings.most_zoom > 0 || settings.zoom_speed;
   if (asked && !may_follow) {
     throw WindowRefused(
-        "a window that follows the picture needs a framing that crops and scales, and no margin");
+        "a window that follows the picture needs a framing that crops and scales or fills the "
+        "edges, and no margin");
   }
   // Still smoothed as it was set, the picture is shown by windows that follow it where the effect's
   // own would show black. Without motion it would have to move.

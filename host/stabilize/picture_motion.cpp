@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <optional>
 
+#include "host/stabilize/homography.h"
 #include "host/stabilize/median.h"
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
@@ -37,72 +38,9 @@ TrackPairs PairsOf(const WarpedPlane& plane, std::size_t frame) {
 constexpr int kColumns = 12, kRows = 7;
 constexpr double kLost = 0.006;  // of the width: a track that left its place, not the scene
 
-// (x, y) -> (h0 x + h1 y + h2, h3 x + h4 y + h5) / (h6 x + h7 y + 1)
-using Homography = std::array<double, 8>;
-
-Point Apply(const Homography& h, Point p) {
-  const double w = h[6] * p.x + h[7] * p.y + 1;
-  return {(h[0] * p.x + h[1] * p.y + h[2]) / w, (h[3] * p.x + h[4] * p.y + h[5]) / w};
-}
-
-// Solves A x = b of the upper triangle, A positive definite (Cholesky); none where it isn't.
-std::optional<Homography> Solve(std::array<std::array<double, 8>, 8> a, Homography b) {
-  for (std::size_t i = 0; i < 8; ++i) {
-    for (std::size_t j = i; j < 8; ++j) {
-      double sum = a[i][j];
-      for (std::size_t k = 0; k < i; ++k) sum -= a[k][i] * a[k][j];
-      if (i == j) {
-        if (!(sum > 1e-12)) return {};
-        a[i][i] = std::sqrt(sum);
-      } else {
-        a[i][j] = sum / a[i][i];
-      }
-    }
-  }
-  for (std::size_t i = 0; i < 8; ++i) {
-    for (std::size_t k = 0; k < i; ++k) b[i] -= a[k][i] * b[k];
-    b[i] /= a[i][i];
-  }
-  for (std::size_t i = 8; i-- > 0;) {
-    for (std::size_t k = i + 1; k < 8; ++k) b[i] -= a[i][k] * b[k];
-    b[i] /= a[i][i];
-  }
-  return b;
-}
-
-// Of points in halves of the width.
-Homography Fit(const TrackPairs& pairs, double unit, const Similarity& start) {
-  Homography h{start.a, -start.b, start.dx / unit, start.b, start.a, start.dy / unit, 0, 0};
-  constexpr int kRounds = 4;
-  constexpr double kFarthest = 1.5 * kTrackTolerance * 2;
-  for (int round = 0; round < kRounds; ++round) {
-    std::array<std::array<double, 8>, 8> a{};
-    Homography b{};
-    for (std::size_t i = 0; i < pairs.now.size(); ++i) {
-      const Point p{pairs.before[i].x / unit, pairs.before[i].y / unit};
-      const Point q{pairs.now[i].x / unit, pairs.now[i].y / unit};
-      const Point reached = Apply(h, p);
-      const double miss = std::hypot(reached.x - q.x, reached.y - q.y) / kFarthest;
-      if (!(miss < 1)) continue;
-      const double weight = (1 - miss * miss) * (1 - miss * miss);
-      const double rows[2][8] = {{p.x, p.y, 1, 0, 0, 0, -p.x * q.x, -p.y * q.x},
-                                 {0, 0, 0, p.x, p.y, 1, -p.x * q.y, -p.y * q.y}};
-      const double right[2] = {q.x, q.y};
-      for (int r = 0; r < 2; ++r) {
-        for (std::size_t j = 0; j < 8; ++j) {
-          if (rows[r][j] == 0) continue;
-          b[j] += weight * rows[r][j] * right[r];
-          for (std::size_t k = j; k < 8; ++k) a[j][k] += weight * rows[r][j] * rows[r][k];
-        }
-      }
-    }
-    // What the tracks leave open stays as the similarity has it: no tilt.
-    a[6][6] += 1e-3, a[7][7] += 1e-3;
-    const std::optional<Homography> solved = Solve(a, b);
-    if (!solved) return h;
-    h = *solved;
-  }
-  return h;
+std::vector<Point> Scaled(std::vector<Point> points, double unit) {
+  for (Point& point : points) point = {point.x / unit, point.y / unit};
+  return points;
 }
 
 using Cells = std::array<std::optional<Point>, kColumns * kRows>;
@@ -112,7 +50,10 @@ Cells Residuals(const TrackPairs& pairs, const Similarity& start, double width, 
   Cells cells;
   if (pairs.now.size() < 8) return cells;
   const double unit = width / 2;
-  const Homography h = Fit(pairs, unit, start);
+  constexpr double kFarthest = 1.5 * kTrackTolerance * 2;
+  const Homography h = FitHomography(
+      Scaled(pairs.before, unit), Scaled(pairs.now, unit),
+      {start.a, -start.b, start.dx / unit, start.b, start.a, start.dy / unit, 0, 0}, kFarthest);
   std::array<std::vector<double>, kColumns * kRows> x, y;
   for (std::size_t i = 0; i < pairs.now.size(); ++i) {
     const Point& q = pairs.now[i];

@@ -11,7 +11,7 @@ namespace calmframe::host {
 struct WindowPlace {
   Point centre;
   // How far the centre may go along each axis before the window, as large and as turned as it is,
-  // leaves the picture; beyond them something is black. Least above most: it is larger than that.
+  // leaves the frame; beyond them something is black or filled. Least above most: it is larger.
   Point least, most;
 };
 

@@ -7,152 +7,14 @@
 #include <limits>
 #include <string>
 
+#include "host/stabilize/centred_bounds.h"
+#include "host/stabilize/homography.h"
+#include "host/stabilize/solved_grid.h"
 #include "host/stabilize/solved_payload.h"
 #include "platform/tessel/filesupport.h"
 
 namespace calmframe::host {
 namespace {
-
-// -- Warps --
-
-// The map of the unit square onto a quadrilateral, corners in the order (0,0), (1,0), (0,1), (1,1)
-// (Heckbert, Fundamentals of Texture Mapping and Image Warping, 1989). As the effect takes it:
-// affine, without the last corner's say, where in x or in y the corners are a parallelogram.
-class SquareToQuad {
- public:
-  explicit SquareToQuad(const std::array<Point, 4>& p) : origin_(p[0]) {
-    const Point sum = {p[0].x - p[1].x + p[3].x - p[2].x, p[0].y - p[1].y + p[3].y - p[2].y};
-    if (std::fabs(sum.x) < 1e-5 || std::fabs(sum.y) < 1e-5) {
-      u_ = {p[1].x - p[0].x, p[1].y - p[0].y};
-      v_ = {p[3].x - p[1].x, p[3].y - p[1].y};
-      return;
-    }
-    const Point d1 = {p[1].x - p[3].x, p[1].y - p[3].y};
-    const Point d2 = {p[2].x - p[3].x, p[2].y - p[3].y};
-    const double determinant = d1.x * d2.y - d2.x * d1.y;
-    g_ = (sum.x * d2.y - d2.x * sum.y) / determinant;
-    h_ = (d1.x * sum.y - sum.x * d1.y) / determinant;
-    u_ = {p[1].x - p[0].x + g_ * p[1].x, p[1].y - p[0].y + g_ * p[1].y};
-    v_ = {p[2].x - p[0].x + h_ * p[2].x, p[2].y - p[0].y + h_ * p[2].y};
-  }
-
-  Point operator()(double u, double v) const {
-    const double w = g_ * u + h_ * v + 1;
-    return {(u_.x * u + v_.x * v + origin_.x) / w, (u_.y * u + v_.y * v + origin_.y) / w};
-  }
-
- private:
-  Point origin_, u_, v_;
-  double g_ = 0, h_ = 0;
-};
-
-// Steps of an offset from that map. It is a float before it is steps.
-constexpr float kStepsPerPixel = 256;
-
-std::int32_t Steps(double offset) {
-  constexpr float kMostSteps = 2147483520;  // the largest float that fits
-  const float steps = static_cast<float>(offset) * kStepsPerPixel;
-  if (std::isnan(steps)) return 0;
-  return static_cast<std::int32_t>(std::round(std::clamp(steps, -kMostSteps, kMostSteps)));
-}
-
-// One frame's warp, rows of a grid of columns x rows vertices.
-class Grid {
- public:
-  Grid(std::size_t columns, std::size_t rows)
-      : vertices_(columns * rows),
-        columns_(columns),
-        rows_(rows),
-        corners_{0, columns - 1, columns * (rows - 1), columns * rows - 1} {}
-
-  static std::size_t StoredBytes(const SolvedLayout& layout) {
-    return kCornerBytes + layout.vertices() * kOffsetBytes;
-  }
-
-  void Read(const SolvedPayload& payload, std::size_t place) {
-    const auto corners = payload.At<std::array<Point, 4>>(place);
-    place += kCornerBytes;
-    ForEach(corners, [&](Point& vertex, Point flat) {
-      const auto steps = payload.At<std::array<std::int32_t, 2>>(place);
-      place += sizeof steps;
-      vertex = {static_cast<double>(static_cast<float>(steps[0]) / kStepsPerPixel) + flat.x,
-                static_cast<double>(static_cast<float>(steps[1]) / kStepsPerPixel) + flat.y};
-    });
-    for (std::size_t i = 0; i < corners.size(); ++i) vertices_[corners_[i]] = corners[i];
-  }
-
-  // Every vertex where it stands in a frame of that size.
-  void Rest(double width, double height) {
-    const Point far = {width - 1, height - 1};
-    ForEach({Point{}, {far.x, 0}, {0, far.y}, far},
-            [](Point& vertex, const Point& flat) { vertex = flat; });
-  }
-
-  // In as many bytes as it was read from.
-  void Write(SolvedPayload& payload, std::size_t place) {
-    std::array<Point, 4> corners;
-    for (std::size_t i = 0; i < corners.size(); ++i) corners[i] = vertices_[corners_[i]];
-    payload.Put(place, corners);
-    place += kCornerBytes;
-    ForEach(corners, [&](const Point& vertex, Point flat) {
-      const std::array<std::int32_t, 2> steps = {Steps(vertex.x - flat.x),
-                                                 Steps(vertex.y - flat.y)};
-      payload.Put(place, steps);
-      place += sizeof steps;
-    });
-  }
-
-  void Move(const Similarity& motion) {
-    for (Point& vertex : vertices_) vertex = motion(vertex);
-  }
-
-  const std::vector<Point>& vertices() const { return vertices_; }
-
- private:
-  // visit(vertex, where the corners' map puts it)
-  template <class Visit>
-  void ForEach(const std::array<Point, 4>& corners, const Visit& visit) {
-    const SquareToQuad quad(corners);
-    for (std::size_t r = 0; r < rows_; ++r) {
-      const double v = static_cast<double>(r) / static_cast<double>(rows_ - 1);
-      for (std::size_t c = 0; c < columns_; ++c) {
-        const double u = static_cast<double>(c) / static_cast<double>(columns_ - 1);
-        visit(vertices_[r * columns_ + c], quad(u, v));
-      }
-    }
-  }
-
-  std::vector<Point> vertices_;
-  std::size_t columns_, rows_;
-  std::array<std::size_t, 4> corners_;
-};
-
-// Of all frames' outlines, as the effect has them: their least and largest coordinates, the largest
-// above 0 in any case; what is no number does not count.
-struct Bounds {
-  Point least = {std::numeric_limits<float>::max(), std::numeric_limits<float>::max()};
-  Point most = {std::numeric_limits<float>::min(), std::numeric_limits<float>::min()};
-
-  // Vertices of one frame.
-  void Add(const Point* vertices, std::size_t columns, std::size_t rows) {
-    for (std::size_t r = 0; r < rows; ++r) {
-      const bool whole = r == 0 || r == rows - 1;
-      for (std::size_t c = 0; c < columns; c += whole ? 1 : columns - 1) {
-        const Point& p = vertices[r * columns + c];
-        if (p.x < least.x) least.x = p.x;
-        if (p.y < least.y) least.y = p.y;
-        if (p.x > most.x) most.x = p.x;
-        if (p.y > most.y) most.y = p.y;
-      }
-    }
-  }
-};
-
-// A folded warp's bounds can lie anywhere; no picture is as large as this.
-double Tame(double coordinate) {
-  constexpr double kFarthest = 1 << 30;
-  return std::clamp(coordinate, -kFarthest, kFarthest);
-}
 
 // -- Windows --
 
@@ -173,7 +35,7 @@ Side WholeFrame(double least, std::int32_t pixels) {
   return {first, last};
 }
 
-std::string CropOfWholeFrame(const SolvedLayout& layout, const Bounds& bounds) {
+std::string CropOfWholeFrame(const SolvedLayout& layout, const OutlineBounds& bounds) {
   const auto width = static_cast<std::int32_t>(layout.square_width());
   const std::int32_t height = layout.source_height;
   const Side x = WholeFrame(bounds.least.x, width), y = WholeFrame(bounds.least.y, height);
@@ -197,23 +59,55 @@ std::size_t StoredCropBytes(const SolvedPayload& payload) {
   return kFields + static_cast<std::size_t>(windows) * sizeof(SolvedClip::Window);
 }
 
-// Entries of the frame map are motions to the output of their second frame.
-void MoveFrameMap(SolvedPayload& payload, const std::vector<Similarity>& output_from_plane) {
+Matrix MatrixOf(const Similarity& s) {
+  return {s.a, -s.b, s.dx, s.b, s.a, s.dy, 0, 0, 1};
+}
+
+// Entries of the frame map are motions to the output of their second frame. then_of(frame): what
+// comes behind those to its output.
+template <class ThenOf>
+void MoveFrameMap(SolvedPayload& payload, const ThenOf& then_of) {
   std::size_t place = payload.layout.map;
   for (std::size_t i = 0; i < payload.layout.map_entries; ++i) {
     const auto frames = payload.At<std::array<std::int32_t, 2>>(place);
-    const Similarity& s = output_from_plane[static_cast<std::size_t>(frames[1])];
     place += kMapKeyBytes;
-    auto m = payload.At<std::array<double, 9>>(place);
-    for (std::size_t c = 0; c < 3; ++c) {
-      const double x = m[c], y = m[3 + c], w = m[6 + c];
-      m[c] = s.a * x - s.b * y + s.dx * w;
-      m[3 + c] = s.b * x + s.a * y + s.dy * w;
-    }
-    payload.Put(place, m);
+    const Matrix then = then_of(static_cast<std::size_t>(frames[1]));
+    payload.Put(place, Product(then, payload.At<Matrix>(place)));
     place += kMatrixBytes;
   }
 }
+
+// Takes frames of that size from where a warp puts them back to where they stand, as near as one
+// homography comes to all vertices.
+class Unbending {
+ public:
+  explicit Unbending(const WarpGrid& rest, double width, double height)
+      : rest_(rest.vertices()),
+        to_unit_{2 / width, 0, (1 - width) / width, 0, 2 / width, (1 - height) / width, 0, 0, 1},
+        from_unit_{width / 2, 0, (width - 1) / 2, 0, width / 2, (height - 1) / 2, 0, 0, 1} {
+    for (Point& point : rest_) point = InUnit(point);
+  }
+
+  // Of as many vertices.
+  Matrix operator()(const Point* vertices) const {
+    std::vector<Point> warped(vertices, vertices + rest_.size());
+    for (Point& point : warped) point = InUnit(point);
+    const Homography h = FitHomography(warped, rest_, {1, 0, 0, 0, 1, 0, 0, 0});
+    Matrix fit{};
+    std::copy(h.begin(), h.end(), fit.begin());
+    fit.back() = 1;
+    return Product(from_unit_, Product(fit, to_unit_));
+  }
+
+ private:
+  Point InUnit(Point p) const {
+    return {p.x * to_unit_[0] + to_unit_[2], p.y * to_unit_[0] + to_unit_[5]};
+  }
+
+  std::vector<Point> rest_;
+  // Between pixels and halves of the width about the middle.
+  Matrix to_unit_, from_unit_;
+};
 
 std::vector<Similarity> Inverses(const std::vector<Similarity>& windows) {
   std::vector<Similarity> inverses;
@@ -244,15 +138,12 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
   clip.rows = layout.rows;
   clip.slots = layout.slots;
 
-  const auto columns = static_cast<std::size_t>(clip.columns);
-  const auto rows = static_cast<std::size_t>(clip.rows);
-  const auto frames = static_cast<std::size_t>(clip.frame_count);
-  Grid grid(columns, rows);
-  Bounds bounds;
-  clip.vertices.reserve(frames * layout.vertices());
-  for (std::size_t f = 0; f < frames; ++f) {
-    grid.Read(payload, layout.warps + f * Grid::StoredBytes(layout));
-    bounds.Add(grid.vertices().data(), columns, rows);
+  WarpGrid grid(layout);
+  OutlineBounds bounds;
+  clip.vertices.reserve(static_cast<std::size_t>(clip.frame_count) * layout.vertices());
+  for (std::size_t f = 0; f < static_cast<std::size_t>(clip.frame_count); ++f) {
+    grid.Read(payload, WarpGrid::PlaceOf(f, layout));
+    bounds.Add(grid);
     clip.vertices.insert(clip.vertices.end(), grid.vertices().begin(), grid.vertices().end());
   }
 
@@ -266,6 +157,14 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
   }
   std::memcpy(clip.statuses.data(), payload.bytes.data() + statuses, layout.cells() * kStatusBytes);
 
+  clip.neighbours.reserve(layout.map_entries);
+  for (std::size_t i = 0; i < layout.map_entries; ++i) {
+    const std::size_t place = layout.map + i * (kMapKeyBytes + kMatrixBytes);
+    const auto frames_of = payload.At<std::array<std::int32_t, 2>>(place);
+    clip.neighbours.push_back(
+        {frames_of[0], frames_of[1], payload.At<Matrix>(place + kMapKeyBytes)});
+  }
+
   if (layout.has_crop) {
     const auto fields = payload.At<std::array<std::int32_t, 5>>(layout.crop + 1);
     clip.crop = {.width = fields[3], .height = fields[4], .origin = bounds.least, .windows = {}};
@@ -277,7 +176,8 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
 }
 
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
-                                      const std::vector<Similarity>& windows, Warps warps) {
+                                      const std::vector<Similarity>& windows, Warps warps,
+                                      PlacedBy placed_by) {
   SolvedPayload payload = ReadPayload(instance);
   const SolvedLayout& layout = payload.layout;
   if (windows.size() != static_cast<std::size_t>(layout.frames)) {
@@ -285,22 +185,32 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
   }
   std::vector<Similarity> output_from_plane = Inverses(windows);
 
-  Grid grid(static_cast<std::size_t>(layout.columns), static_cast<std::size_t>(layout.rows));
-  const auto columns = static_cast<std::size_t>(layout.columns);
-  const auto rows = static_cast<std::size_t>(layout.rows);
-  const auto place = [&](std::size_t f) { return layout.warps + f * Grid::StoredBytes(layout); };
-  const auto take = [&](std::size_t f) {
-    if (warps == Warps::solved) {
-      grid.Read(payload, place(f));
-    } else {
-      grid.Rest(layout.square_width(), layout.source_height);
+  const auto frames = windows.size();
+  const double width = layout.square_width(), height = layout.source_height;
+  WarpGrid rest(layout);
+  rest.Rest(width, height);
+  std::vector<Matrix> unbent;
+  if (warps == Warps::none) {
+    const Unbending unbending(rest, width, height);
+    WarpGrid bent(layout);
+    for (std::size_t f = 0; f < frames; ++f) {
+      bent.Read(payload, WarpGrid::PlaceOf(f, layout));
+      unbent.push_back(unbending(bent.vertices().data()));
     }
+  }
+  const auto grid_of = [&](std::size_t f) {
+    WarpGrid grid = rest;
+    if (warps == Warps::solved) grid.Read(payload, WarpGrid::PlaceOf(f, layout));
     grid.Move(output_from_plane[f]);
+    return grid;
   };
-  Bounds bounds;
-  for (std::size_t f = 0; f < windows.size(); ++f) {
-    take(f);
-    bounds.Add(grid.vertices().data(), columns, rows);
+  OutlineBounds bounds;
+  for (std::size_t f = 0; f < frames; ++f) bounds.Add(grid_of(f));
+  std::vector<Pull> pulls;
+  if (placed_by == PlacedBy::bounds) pulls = FindPulls(layout, bounds, grid_of);
+  for (const Pull& pull : pulls) {
+    bounds.least.*pull.axis = std::min(bounds.least.*pull.axis, pull.to);
+    bounds.most.*pull.axis = std::max(bounds.most.*pull.axis, pull.to);
   }
   // The effect draws nothing past the bounds' size, counted from 0 and not from their least: where
   // that lies inside the frame, all goes to the left and up by as much, and the crop with it.
@@ -311,42 +221,61 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
     motion.dy -= back.y;
   }
   bounds = {};
-  for (std::size_t f = 0; f < windows.size(); ++f) {
-    take(f);
-    grid.Write(payload, place(f));
-    grid.Read(payload, place(f));
-    bounds.Add(grid.vertices().data(), columns, rows);
+  for (std::size_t f = 0; f < frames; ++f) {
+    WarpGrid grid = grid_of(f);
+    for (const Pull& pull : pulls) {
+      if (pull.frame == f) grid.corner(pull.corner).*pull.axis = pull.to;
+    }
+    grid.Write(payload, WarpGrid::PlaceOf(f, layout));
+    grid.Read(payload, WarpGrid::PlaceOf(f, layout));
+    bounds.Add(grid);
   }
-  MoveFrameMap(payload, output_from_plane);
-  const Bounds in_output = {{bounds.least.x + back.x, bounds.least.y + back.y},
-                            {bounds.most.x + back.x, bounds.most.y + back.y}};
+  MoveFrameMap(payload, [&](std::size_t f) {
+    const Matrix moved = MatrixOf(output_from_plane[f]);
+    return unbent.empty() ? moved : Product(moved, unbent[f]);
+  });
+  const OutlineBounds in_output = {{bounds.least.x + back.x, bounds.least.y + back.y},
+                                   {bounds.most.x + back.x, bounds.most.y + back.y}};
   payload.bytes.replace(layout.crop, StoredCropBytes(payload), CropOfWholeFrame(layout, in_output));
 
   return InstanceOf(payload.bytes);
 }
 
-std::vector<Point> GridAtRest(const SolvedClip& clip) {
-  Grid grid(static_cast<std::size_t>(clip.columns), static_cast<std::size_t>(clip.rows));
+namespace {
+
+WarpGrid RestingGrid(const SolvedClip& clip) {
+  WarpGrid grid(static_cast<std::size_t>(clip.columns), static_cast<std::size_t>(clip.rows));
   grid.Rest(clip.width, clip.height);
-  return grid.vertices();
+  return grid;
 }
 
-SolvedClip WithoutWarps(SolvedClip clip) {
-  const std::vector<Point> rest = GridAtRest(clip);
-  for (std::size_t i = 0; i < clip.vertices.size(); ++i) clip.vertices[i] = rest[i % rest.size()];
-  return clip;
+}  // namespace
+
+std::vector<Point> GridAtRest(const SolvedClip& clip) {
+  return RestingGrid(clip).vertices();
+}
+
+std::vector<SolvedClip::Neighbour> NeighboursIn(const SolvedClip& clip, Warps warps) {
+  std::vector<SolvedClip::Neighbour> neighbours = clip.neighbours;
+  if (warps == Warps::solved) return neighbours;
+  const WarpGrid rest = RestingGrid(clip);
+  const Unbending unbending(rest, clip.width, clip.height);
+  std::vector<Matrix> unbent;
+  for (std::size_t at = 0; at < clip.vertices.size(); at += rest.vertices().size()) {
+    unbent.push_back(unbending(clip.vertices.data() + at));
+  }
+  for (SolvedClip::Neighbour& neighbour : neighbours) {
+    neighbour.plane_from_frame =
+        Product(unbent[static_cast<std::size_t>(neighbour.in)], neighbour.plane_from_frame);
+  }
+  return neighbours;
 }
 
 Point ShiftWithoutCrop(const SolvedClip& clip) {
   if (!clip.crop || clip.crop->windows.empty()) {
     throw std::invalid_argument("a clip without windows");
   }
-  const auto columns = static_cast<std::size_t>(clip.columns);
-  const auto rows = static_cast<std::size_t>(clip.rows);
-  Bounds bounds;
-  for (std::size_t at = 0; at < clip.vertices.size(); at += columns * rows) {
-    bounds.Add(clip.vertices.data() + at, columns, rows);
-  }
+  const OutlineBounds bounds = BoundsOf(clip);
   const SolvedClip::Window& shown = clip.crop->windows.front();
   // Along one axis: the bounds' least goes to the left end of a buffer that the frame lies in the
   // middle of, by whole pixels. With a crop the middles of the window and the frame meet.

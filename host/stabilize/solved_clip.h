@@ -5,6 +5,7 @@
 #include <stdexcept>
 #include <vector>
 
+#include "host/stabilize/homography.h"
 #include "host/stabilize/similarity.h"
 
 // What a solved effect remembers, for programs that look at its warps or change what they show. The
@@ -38,6 +39,15 @@ struct SolvedClip {
   std::vector<Point> tracks;
   std::vector<std::int32_t> statuses;
 
+  // What a framing that fills the edges lays behind a frame: another one, whose pixels the matrix
+  // takes to the stabilized plane, where frame `in` stands. From a file it may be any, and of no
+  // number.
+  struct Neighbour {
+    std::int32_t frame, in;
+    Matrix plane_from_frame;
+  };
+  std::vector<Neighbour> neighbours;  // by frame, then by where it is laid
+
   // The effect's own framing. `left` to `bottom` from `origin`, both ends included.
   struct Window {
     float left, top, right, bottom;
@@ -66,8 +76,14 @@ enum class Warps { solved, none };
 // Where a frame's vertices stand in the source, by row, column.
 std::vector<Point> GridAtRest(const SolvedClip& clip);
 
-// The clip with all vertices at rest.
-SolvedClip WithoutWarps(SolvedClip clip);
+// The clip's neighbours in the plane that its frames make. Without warps each is taken from where
+// its frame's warp puts the frame back to the frame, by the homography that is nearest to the warp:
+// what that bends besides is left.
+std::vector<SolvedClip::Neighbour> NeighboursIn(const SolvedClip& clip, Warps warps);
+
+// How the framing places the picture that an instance is loaded under: 2 and 3 by its crop, 1 and 4
+// by the bounds of all frames' outlines.
+enum class PlacedBy { crop, bounds };
 
 // The instance of an effect that shows, of each frame, what windows[frame] tells: it takes points
 // of the output frame to the stabilized plane. What the instance holds besides stays, byte by byte,
@@ -78,24 +94,29 @@ SolvedClip WithoutWarps(SolvedClip clip);
 // have been saved under the very framing and maximum scale that it is loaded with: otherwise the
 // effect takes what it shows for the plane, and finds a crop of its own there.
 //
-// A framing that does not crop (1 and 4) shows the whole plane about its middle; see
-// ShiftWithoutCrop. Neighbours that fill the edges go with their frame.
+// A framing that does not crop (1 and 4) centres the bounds of all frames' outlines, wherever the
+// output frame lies in them. PlacedBy::bounds puts the output frame in their middle, to the
+// fraction of a pixel: some frame's corner goes as far out as it takes, up to once for each side.
+// It is one of a cell that lies beside the output frame, so that nobody sees it; or, where there is
+// none in any frame, that which goes the least way. Neighbours that fill the edges go with their
+// frame.
 //
 // Vertices are rounded to 1/256 pixel of the output frame. For the effect's sake the plane of the
 // new instance may lie some whole pixels to the left of the output frame, and above; its crop's
-// windows are the output frame. Without warps the frame map stays that of those that were solved:
-// not for framing 4, nor for deblurring. Throws NoSolvedClip as above, and std::invalid_argument
+// windows are the output frame. Without warps the neighbours are those of NeighboursIn; deblurring
+// goes by the warps that were solved. Throws NoSolvedClip as above, and std::invalid_argument
 // where the windows are not one a frame, or one has no inverse.
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
                                       const std::vector<Similarity>& windows,
-                                      Warps warps = Warps::solved);
+                                      Warps warps = Warps::solved,
+                                      PlacedBy placed_by = PlacedBy::crop);
 
 // How far from its place in the output frame a framing that does not crop shows every picture, to
 // the right and downwards, in the source's own pixels, at full render scale and 100 %; of a clip
-// that was read from what WithWindows made. It is the same for all frames: the effect centres the
-// bounds of all frames' outlines, and rounds that to whole pixels for the place of the frame in its
-// buffer. No windows can undo it, since what moves them all moves the bounds too. Throws
-// std::invalid_argument for a clip without windows.
+// that was read from what WithWindows made. It is the same for all frames, and 0 where it was made
+// for PlacedBy::bounds: the effect centres the bounds of all frames' outlines, and rounds that to
+// whole pixels for the place of the frame in its buffer. Windows alone can't undo it, since what
+// moves them all moves the bounds too. Throws std::invalid_argument for a clip without windows.
 Point ShiftWithoutCrop(const SolvedClip& clip);
 
 }  // namespace calmframe::host

@@ -24,7 +24,9 @@ constexpr std::int32_t kCancelButton = 11;
 constexpr std::int32_t kStabilizationGroup = 12;
 constexpr std::int32_t kAutoScaleGroup = 17;  // its name tells the scale
 constexpr std::int32_t kMethod = HX_METHOD.disk_id;
-constexpr std::int32_t kDeblur = 15;  // an experts' group, with a checkbox
+constexpr std::int32_t kDeblur = 15;                         // an experts' group, with a checkbox
+constexpr std::int32_t kSynthesisCuts[] = {31, 32, 33, 34};  // pixels taken off each side
+constexpr std::int32_t kAlphaBoost = 283;
 
 // Where few tracks are, those that leave the others by more than so many pixels of a picture 1000
 // wide count less. Of eight filmed clips' first 6 to 14 frames 2 to 3 kept the most of the width.
@@ -395,6 +397,12 @@ SolvedClip SteadyClip::Solved() {
   return Solved(*effect_, &saved, path());
 }
 
+SolvedClip SteadyClip::SolvedAndFramed() {
+  SolvedClip solved = Solved();
+  if (!Crops(ValueOf(HX_FRAMING.disk_id))) solved.crop.reset();  // from a framing before
+  return solved;
+}
+
 SolvedClip SteadyClip::Solved(Effect& effect, SavedEffect* saved, const std::string& name) {
   const CommandResult result = effect.Save(saved);
   if (!result.ok()) throw SolveFailure(result.Line(name));
@@ -467,6 +475,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   settings.zoom_speed = request.zoom_speed;
   settings.frames_per_second = FramesPerSecond();
   settings.enlarged = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
+  settings.filling = FillingOfEdges();
   if (stands) {
     Chooser chooser(solved, settings);
     chooser.Take(*choice_, solved);
@@ -565,6 +574,7 @@ void SteadyClip::BecomeCopy(Effect& copy, Watcher& watcher) {
   TakeAsSaved();
   Unseen unseen(watcher);
   const double framing = ValueOf(HX_FRAMING.disk_id);
+  if (!Crops(framing)) return;
   // Its crop window, too, is to be that of the warps as they are saved.
   Set(HX_FRAMING.disk_id, kStabilizeOnly);
   Progress shown;
@@ -577,7 +587,13 @@ void SteadyClip::BecomeCopy(Effect& copy, Watcher& watcher) {
 
 void SteadyClip::Draw(const Choice& choice, const std::vector<Similarity>& windows,
                       SavedEffect saved, Watcher& watcher) {
-  saved.instance = WithWindows(saved.instance, windows, choice.best().warps);
+  const bool fills = choice.best().follows && ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
+  saved.instance = WithWindows(saved.instance, windows, choice.best().warps,
+                               fills ? PlacedBy::bounds : PlacedBy::crop);
+  // Of a clip as it was filmed nothing is feathered and filled.
+  if (!fills && !Crops(ValueOf(HX_FRAMING.disk_id))) {
+    saved.values[HX_FRAMING.disk_id] = kStabilizeOnly;
+  }
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
   drawn_ = &session_.Load(LayerOfItsOwn(), saved);
   windows_ = windows;
@@ -595,12 +611,13 @@ void SteadyClip::DrawByItself() {
 
 Outcome SteadyClip::Measure() {
   if (drawn_) return choice_->best().outcome;
-  const SolvedClip solved = Solved();
+  const SolvedClip solved = SolvedAndFramed();
   const double zoom = Zoom(solved);
   const WarpedPlane plane(solved, Warps::solved), rest(solved, Warps::none);
-  Outcome outcome = MeasureOutcome(MotionOfSource(solved, FindMotion(rest)),
-                                   MotionShown(plane, FindMotion(plane), OwnWindows(solved, zoom)),
-                                   FramesPerSecond());
+  Outcome outcome = MeasureOutcome(
+      MotionOfSource(solved, FindMotion(rest)),
+      MotionShown(plane, FindMotion(plane), OwnWindows(solved, zoom), FillingOfEdges()),
+      FramesPerSecond());
   if (solved.crop) {  // the effect draws the window alone, which a maximum scale leaves small
     const double across = std::min(1.0, zoom * solved.crop->width / solved.width);
     const double down = std::min(1.0, zoom * solved.crop->height / solved.height);
@@ -610,12 +627,22 @@ Outcome SteadyClip::Measure() {
 }
 
 ShownPath SteadyClip::Path() {
-  const SolvedClip solved = Solved();
+  const SolvedClip solved = SolvedAndFramed();
   ShownPath path = drawn_ ? PathShown(solved, choice_->best().warps, windows_)
                           : PathShown(solved, Warps::solved, OwnWindows(solved, Zoom(solved)));
   path.most_zoom = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100 *
                    (drawn_ ? choice_->most_zoom : ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100);
   return path;
+}
+
+std::optional<Filling> SteadyClip::FillingOfEdges() const {
+  if (ValueOf(HX_FRAMING.disk_id) != kSynthesizeEdges) return {};
+  double cut = 0;
+  for (const std::int32_t side : kSynthesisCuts) cut = std::max(cut, ValueOf(side));
+  const double reach = std::round(ValueOf(HX_SYNTHESIS_INPUT_RANGE.disk_id) * FramesPerSecond());
+  return Filling{
+      .reach = static_cast<int>(std::min(reach, double{std::numeric_limits<int>::max()})),
+      .rim = RimOf(cut, ValueOf(HX_SYNTHESIS_EDGE_FEATHER.disk_id), ValueOf(kAlphaBoost))};
 }
 
 double SteadyClip::FramesPerSecond() const {

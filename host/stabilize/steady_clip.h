@@ -107,11 +107,12 @@ class SteadyClip {
   // as Work.
   void SolveAnew(Watcher& watcher);
 
-  // After Work, with a framing that crops: from now on what is drawn are the calmest windows that
-  // stay in the picture, in place of the effect's own crop window. Where it may choose, parameters
-  // that nobody set are tried on copies of the effect, which solve side by side; the effect becomes
-  // the one that serves the clip best, and what was chosen is saved with it. A choice that was made
-  // before stands as long as controls and request do. Throws Interrupted, SolveFailure.
+  // After Work, with a framing that crops or fills the edges: from now on what is drawn are the
+  // calmest windows that stay in the picture, in place of what the effect shows by itself. Where it
+  // may choose, parameters that nobody set are tried on copies of the effect, which solve side by
+  // side; the effect becomes the one that serves the clip best, and what was chosen is saved with
+  // it. A choice that was made before stands as long as controls and request do. Throws
+  // Interrupted, SolveFailure.
   void FollowPicture(const FollowRequest& request, Watcher& watcher);
   // After Work: solves anew without the tracks of the background or the subject, or with all, as
   // where there is no subject. Automatic leaves them as they are. Throws as Work.
@@ -120,7 +121,7 @@ class SteadyClip {
   const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }
   // Made by FollowPicture since it was opened or saved.
   bool has_new_choice() const { return has_new_choice_; }
-  // After Work, with a framing that crops: what the output shows.
+  // After Work: what the output shows.
   Outcome Measure();
   // The same frame by frame. Throws SolveFailure.
   ShownPath Path();
@@ -163,6 +164,8 @@ class SteadyClip {
   void Set(std::int32_t disk_id, double value);
   // What the effect would save, and what of it is solved. Throws SolveFailure.
   static SolvedClip Solved(Effect& effect, SavedEffect* saved, const std::string& name);
+  // Solved, with a crop only where the framing has one.
+  SolvedClip SolvedAndFramed();
   // Of its own, for another effect on the same clip.
   boost::shared_ptr<Layer> LayerOfItsOwn() const;
   // Whether nobody set a parameter, so that it may be chosen.
@@ -179,6 +182,8 @@ class SteadyClip {
             Watcher& watcher);
   void DrawByItself();
   double FramesPerSecond() const;  // fields, of an interlaced clip
+  // None of a framing that leaves the edges empty.
+  std::optional<Filling> FillingOfEdges() const;
   // At which the effect shows its crop window.
   double Zoom(const SolvedClip& solved) const;
   // Throws SolveFailure where the effect is not ready.

@@ -18,6 +18,7 @@ class WarpedPlane {
   WarpedPlane(const SolvedClip& clip, Warps warps);
 
   const SolvedClip& clip() const { return clip_; }
+  Warps warps() const { return of_frame_ > 0 ? Warps::solved : Warps::none; }
 
   WarpView Warp(std::size_t frame) const {
     return {vertices_.data() + frame * of_frame_, clip_.columns, clip_.rows};

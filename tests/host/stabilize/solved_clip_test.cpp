@@ -1,7 +1,9 @@
 #include "host/stabilize/solved_clip.h"
 
+#include <algorithm>
 #include <cstring>
 
+#include "host/stabilize/follow_windows.h"
 #include "platform/hx/hx_controls.h"
 #include "tests/contract/played_plugin.h"
 
@@ -18,6 +20,7 @@ struct Case {
   HX_Ratio aspect = {1, 1};
   int width = 160, height = 120;
   std::int32_t field_type = HX_FIELD_PROGRESSIVE, start = 0;
+  Warps warps = Warps::solved;
 };
 
 class SolvedClipTest : public PlayedPlugin {
@@ -50,9 +53,11 @@ class SolvedClipTest : public PlayedPlugin {
   }
 
   // A second effect, which must have nothing to do.
-  Effect& Moved(const Played& played, const Windows& windows) {
+  Effect& Moved(const Played& played, const Windows& windows, Warps warps = Warps::solved) {
     SavedEffect moved = played.saved;
-    moved.instance = WithWindows(moved.instance, windows);
+    const bool crops = moved.values[HX_FRAMING.disk_id] != 4;
+    moved.instance =
+        WithWindows(moved.instance, windows, warps, crops ? PlacedBy::crop : PlacedBy::bounds);
     moved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
     const std::uint64_t analysed = Analysed();
     Effect& effect = session().Load(played.other_layer, moved);
@@ -91,13 +96,13 @@ class SolvedClipTest : public PlayedPlugin {
 };
 
 // One pixel of each cell of a frame's warp must show its place in the source. Cells are so small
-// that three corners tell the map. shift: of the whole picture, in the source's pixels.
-void ExpectCells(const SolvedClip& clip, int row, const Similarity& window, Point shift,
+// that three corners tell the map.
+void ExpectCells(const SolvedClip& clip, int row, const Similarity& window,
                  const WorldBuffer& source, const WorldBuffer& picture) {
   const int width = clip.source_width, height = clip.height;
   const auto vertex = [&](int c, int r) {
     const Point p = Inverse(window)(clip.vertices[(row * clip.rows + r) * clip.columns + c]);
-    return Point{(p.x + 0.5) * width / clip.width - 0.5 + shift.x, p.y + shift.y};
+    return Point{(p.x + 0.5) * width / clip.width - 0.5, p.y};
   };
   double worst = 0;
   int compared = 0;
@@ -130,18 +135,20 @@ void ExpectCells(const SolvedClip& clip, int row, const Similarity& window, Poin
 }
 
 TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
-  const Case cases[] = {{"scaled", 3, 4},
-                        {"position, odd sizes", 2, 1, {1, 1}, 161, 121},
-                        {"similarity, narrow pixels", 3, 2, {8, 9}},
-                        {"perspective, wide pixels, trimmed", 2, 3, {4, 3}, 160, 120, 0, 3},
-                        {"fields", 3, 4, {1, 1}, 160, 120, HX_FIELD_FIRST_ORDER},
-                        {"synthesized", 4, 1},
-                        {"wide, synthesized", 4, 1, {4, 3}}};
+  const Case cases[] = {
+      {"scaled", 3, 4},
+      {"position, odd sizes", 2, 1, {1, 1}, 161, 121},
+      {"similarity, narrow pixels", 3, 2, {8, 9}},
+      {"perspective, wide pixels, trimmed", 2, 3, {4, 3}, 160, 120, 0, 3},
+      {"fields", 3, 4, {1, 1}, 160, 120, HX_FIELD_FIRST_ORDER},
+      {"synthesized", 4, 1},
+      {"wide, synthesized", 4, 1, {4, 3}},
+      {.name = "not bent, synthesized", .framing = 4, .method = 1, .warps = Warps::none}};
   constexpr int kRow = 5;
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     const Played played = Play(c);
-    const SolvedClip& clip = played.clip;
+    SolvedClip clip = played.clip;
     const bool fields = c.field_type != HX_FIELD_PROGRESSIVE, synthesized = c.framing == 4;
     EXPECT_EQ(clip.frame_count, (16 - c.start) * (fields ? 2 : 1));
     EXPECT_EQ(clip.first_frame, c.start);
@@ -165,6 +172,11 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
     }
     EXPECT_GT(tracked, 50);
     EXPECT_GT(still, tracked * 0.9);
+    if (c.warps == Warps::none) {
+      const std::vector<Point> rest = GridAtRest(clip);
+      std::copy(rest.begin(), rest.end(),
+                clip.vertices.begin() + kRow * static_cast<std::ptrdiff_t>(rest.size()));
+    }
     const Point corner = clip.vertices[kRow * clip.columns * clip.rows];
     const double aspect = clip.width / static_cast<double>(clip.source_width);
     for (const double scale : {0.8, 1.2, 2.0}) {  // the last leaves a rim of nothing all around
@@ -175,18 +187,20 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
                            clip.width * (1 - scale) / 2 + 2.7 + 0.37 * f,
                            clip.height * (1 - scale) / 2 - 4.3 - 0.41 * f});
       }
-      Effect& moved = Moved(played, windows);
-      const Point shift =
-          synthesized ? ShiftWithoutCrop(ReadSolvedClip(Saved(moved).instance)) : Point{};
+      Effect& moved = Moved(played, windows, c.warps);
+      if (synthesized) {
+        const Point shift = ShiftWithoutCrop(ReadSolvedClip(Saved(moved).instance));
+        EXPECT_NEAR(std::hypot(shift.x, shift.y), 0, 1e-4);  // windows are floats
+      }
       const auto picture = moved.MakeRenderer()->Planned({kRow}).OnLayer();
-      ExpectCells(clip, kRow, windows[kRow], shift, *SourceFrame(*played.effect, kRow + c.start),
+      ExpectCells(clip, kRow, windows[kRow], *SourceFrame(*played.effect, kRow + c.start),
                   *picture);
       // Beside the frame neighbours show what the camera saw then, or nothing does.
       double sum = 0;
       int filled = 0;
       for (int i = 0; i < clip.source_width * clip.height; ++i) {
         const int x = i % clip.source_width, y = i / clip.source_width;
-        const Point p = windows[kRow]({(x - shift.x + 0.5) * aspect - 0.5, y - shift.y});
+        const Point p = windows[kRow]({(x + 0.5) * aspect - 0.5, double(y)});
         const Point from = {(p.x - corner.x) / aspect, p.y - corner.y};
         const HX_Pixel8& pixel = picture->row<HX_Pixel8>(y)[x];
         const bool beside = std::min(from.x, from.y) < -4 || from.x > clip.source_width + 3 ||
@@ -199,6 +213,81 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
       EXPECT_LE(sum, filled * 8);
     }
   }
+}
+
+// By both framings the very same picture, wherever a frame has one: the corners that put the middle
+// of the bounds right are such as nobody sees. Of the first frames all four are seen.
+TEST_F(SolvedClipTest, WhereTheBoundsLieIsNotSeen) {
+  const Played cropped = Play({"one", 3, 2}), filled = Play({"one", 4, 2});
+  const SolvedClip& clip = filled.clip;
+  ASSERT_TRUE(clip.vertices == cropped.clip.vertices);
+  for (const Point aside : {Point{9, -7}, Point{-9, 7}}) {
+    Windows windows;
+    for (int f = 0; f < clip.frame_count; ++f) {
+      const double scale = f < 4 ? 1.2 : 0.7;
+      windows.push_back({scale, 0, clip.width * (1 - scale) / 2 + (f < 4 ? 0 : aside.x),
+                         clip.height * (1 - scale) / 2 + (f < 4 ? 0 : aside.y)});
+    }
+    Effect& moved = Moved(filled, windows);
+    const Point shift = ShiftWithoutCrop(ReadSolvedClip(Saved(moved).instance));
+    EXPECT_NEAR(std::hypot(shift.x, shift.y), 0, 1e-4);
+    const auto by_crop = Moved(cropped, windows).MakeRenderer(), by_fill = moved.MakeRenderer();
+    for (int f = 0; f < clip.frame_count; ++f) {
+      const auto own = by_crop->Planned({f, 16}).OnLayer(),
+                 all = by_fill->Planned({f, 16}).OnLayer();
+      int covered = 0, others = 0;
+      for (int i = 0; i < clip.width * clip.height; ++i) {
+        const HX_Pixel16& a = own->row<HX_Pixel16>(i / clip.width)[i % clip.width];
+        const HX_Pixel16& b = all->row<HX_Pixel16>(i / clip.width)[i % clip.width];
+        covered += a.alpha == 32768;
+        others += a.alpha == 32768 && std::abs(a.red - b.red) > 40;
+      }
+      EXPECT_GT(covered, clip.width * clip.height / 2) << f;
+      EXPECT_EQ(others, 0) << f;
+    }
+  }
+}
+
+// Windows leave their frames where the frames around have a picture.
+TEST_F(SolvedClipTest, FilledEdgesLeaveNothingOpen) {
+  const Played cropped = Play({"one", 3, 2});
+  Played filled = Play({"one", 4, 2});
+  const SolvedClip& clip = filled.clip;
+  const WarpedPlane plane(clip, Warps::solved);
+  const PictureMotion motion = FindMotion(plane);
+  const auto width_kept = [&](const FollowSettings& settings) {
+    double sum = 0;
+    for (const Similarity& w : FollowWindows(plane, motion, settings)) sum += w.a;
+    return sum / clip.frame_count;
+  };
+  for (const double feather : {0.0, 20.0}) {
+    SCOPED_TRACE(feather);
+    filled.saved.values[HX_SYNTHESIS_EDGE_FEATHER.disk_id] = feather;
+    FollowSettings settings;
+    settings.filling = Filling{12, RimOf(0, feather, 5)};
+    EXPECT_GT(width_kept(settings), width_kept({}) + 0.02);
+    const Windows windows = FollowWindows(plane, motion, settings);
+    const auto by_crop = Moved(cropped, windows).MakeRenderer(),
+               by_fill = Moved(filled, windows).MakeRenderer();
+    int beside = 0, open = 0;
+    for (int f = 0; f < clip.frame_count; ++f) {
+      const auto own = by_crop->Planned({f, 16}).OnLayer(),
+                 all = by_fill->Planned({f, 16}).OnLayer();
+      for (int i = 0; i < clip.width * clip.height; ++i) {
+        const int x = i % clip.width, y = i / clip.width;
+        beside += own->row<HX_Pixel16>(y)[x].alpha == 0;
+        open += all->row<HX_Pixel16>(y)[x].alpha < 32760;
+      }
+    }
+    EXPECT_GT(beside, 5000);
+    EXPECT_EQ(open, 0);
+    const ShownMotion shown = MotionShown(plane, motion, windows, settings.filling);
+    EXPECT_LT(*std::max_element(shown.uncovered.begin(), shown.uncovered.end()), 0.001);
+  }
+  // What nobody has is told: windows that show more than all frames together.
+  const FilledPlane all(plane, {12, 2.5});
+  EXPECT_GT(all.UncoveredShare(5, {1.5, 0, 0, 0}), 0.2);
+  EXPECT_TRUE(all.RegionAround(5, {1.5, 0, 0, 0}).empty());
 }
 
 // The payload's length goes with the bytes.
@@ -231,7 +320,7 @@ TEST_F(SolvedClipTest, PerspectiveWarps) {
   const std::size_t mesh = After(bytes, "hseM") + 8;
   std::memset(bytes.data() + mesh, 0, sizeof corners + played.clip.columns * played.clip.rows * 8);
   std::memcpy(bytes.data() + mesh, corners, sizeof corners);
-  const SolvedClip turned = ReadSolvedClip(bytes);
+  SolvedClip turned = ReadSolvedClip(bytes);
   const SolvedClip back = ReadSolvedClip(WithWindows(bytes, Windows(16, turn)));
   for (int i = 0; i < turned.columns * turned.rows; ++i) {
     const Point p = keystone(i % turned.columns / (turned.columns - 1.0),
@@ -240,8 +329,23 @@ TEST_F(SolvedClipTest, PerspectiveWarps) {
     ASSERT_NEAR(std::hypot(a.x - q.x, a.y - q.y), 0, 1e-9) << i;
     ASSERT_NEAR(std::hypot(b.x - p.x, b.y - p.y), 0, 0.003) << i;
   }
+  // What is laid where the keystone puts the frame, turned, lies over the frame at rest. Matrices
+  // by hand: the keystone's of x / 159 and y / 119, and x - y, x + y of it.
+  const double k[] = {
+      160 / 159.0, 30 / 119.0, 0, (10 - 110 * 0.3125 / 0.96) / 159, (110 + 24) / 119.0, 40,
+      0.25 / 159,  0.6 / 119,  1};
+  turned.neighbours = {{1,
+                        0,
+                        {k[0] - k[3], k[1] - k[4], k[2] - k[5], k[0] + k[3], k[1] + k[4],
+                         k[2] + k[5], k[6], k[7], k[8]}}};
+  const Matrix over = NeighboursIn(turned, Warps::none)[0].plane_from_frame;
+  for (const Point& p : {Point{0, 0}, Point{159, 0}, Point{0, 119}, Point{159, 119}}) {
+    const double w = over[6] * p.x + over[7] * p.y + over[8];
+    EXPECT_NEAR((over[0] * p.x + over[1] * p.y + over[2]) / w, p.x, 0.01);
+    EXPECT_NEAR((over[3] * p.x + over[4] * p.y + over[5]) / w, p.y, 0.01);
+  }
   Effect& effect = Moved(played, Windows(16, turn));  // which sees it so too
-  ExpectCells(turned, 0, turn, {}, *SourceFrame(effect, 0),
+  ExpectCells(turned, 0, turn, *SourceFrame(effect, 0),
               *effect.MakeRenderer()->Planned({0}).OnLayer());
 }
 
