@@ -95,6 +95,7 @@ TEST_F(FilmTest, EachShotIsSolvedAsItIsAlone) {
     const std::vector<Worked> found = Work(film);
     ASSERT_EQ(found.size(), 3u);
     for (std::size_t s = 0; s < 3; ++s) EXPECT_TRUE(found[s] == alone[s]) << s;
+    if (opening == Opening::decoded) continue;
     // Saved work is taken up shot by shot, and a run that was stopped goes on to the same end.
     for (std::size_t kept = 1; kept <= 3; ++kept) {
       Project saved = film.Saved();
