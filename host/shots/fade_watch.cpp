@@ -15,19 +15,27 @@ constexpr double kLow = 0.25;
 constexpr double kWhole = 0.8;
 // Frames in which the picture can be seen, and is seen to fade.
 constexpr double kFaint[2] = {0.3, 0.75};
+// How far black and white may seem from themselves, in 255ths, as the picture's light changes.
+constexpr double kBase = 24;
 // Differences, see DigestMatch: of a picture to itself, faint; of two pictures.
 constexpr double kItself = 0.25, kOther = 0.12;
 
 // Whether the frames from a picture to a plain one, `count` away and behind it or before it, show
-// it fainter at first, where any are between: whoever pans over a wall has a plain picture too.
+// it fainter, where any are between: whoever pans over a wall has a plain picture too. They show
+// it; or, where it moves too much for that, what they add to it is black in all of them, or white.
 bool FadesFrom(const FrameHistory& history, std::int64_t picture, std::int64_t count) {
   const std::int64_t step = count < 0 ? -1 : 1;
-  for (std::int64_t f = picture + step; f != picture + count; f += step) {
-    if (!history.Holds(f)) break;
+  bool shown = true, first = true, to_black = true, to_white = true;
+  for (std::int64_t f = picture + step; f != picture + count && history.Holds(f); f += step) {
     const double part = history.contrast(f) / history.contrast(picture);
-    if (part > kFaint[0] && part < kFaint[1]) return history.Difference(picture, f) < kItself;
+    if (!(part > kFaint[0] && part < kFaint[1])) continue;
+    if (first) shown = history.Difference(picture, f) < kItself;
+    first = false;
+    const double added = (history.mean(f) - part * history.mean(picture)) / (1 - part);
+    to_black = to_black && added < kBase;
+    to_white = to_white && added > 255 - kBase;
   }
-  return true;
+  return shown || to_black || to_white;
 }
 
 }  // namespace
@@ -101,7 +109,7 @@ std::optional<ShotBorder> FadeWatch::Judge(const FrameHistory& history) const {
   while (history.contrast(behind) < kWhole * most) ++behind;
   if (!FadesFrom(history, behind, plain_last_ - behind)) return {};
   // The same picture goes on behind a flash or a frame that was lost.
-  const bool short_one = plain_last_ - plain_first_ < second_ / 4;
+  const bool short_one = behind - before_frame_ < second_ / 4;
   const double difference = MatchOf(before_, history.digest(behind)).difference;
   if (short_one && difference < kOther) return {};
   ShotBorder border;
