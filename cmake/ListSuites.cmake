@@ -15,7 +15,7 @@ set(text)
 foreach(suite IN LISTS suites)
   set(filter "${suite}.*:*/${suite}.*:${suite}/*.*:*/${suite}/*.*")
   string(APPEND text "add_test([[${NAME}.${suite}]] [[${PROGRAM}]] [[--gtest_filter=${filter}]])\n"
-    "set_tests_properties([[${NAME}.${suite}]] PROPERTIES TIMEOUT 900 LABELS [[${LABELS}]])\n")
+    "set_tests_properties([[${NAME}.${suite}]] PROPERTIES TIMEOUT 900 COST ${COST} LABELS [[${LABELS}]])\n")
 endforeach()
 if(NOT suites)
   message(FATAL_ERROR "${NAME} has no test")

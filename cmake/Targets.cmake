@@ -37,8 +37,9 @@ function(calmframe_program name)
   target_link_libraries(${name} PRIVATE ${ARG_LINKS})
 endfunction()
 
-# calmframe_test(host_test [LABELS threads] SOURCES ... [LINKS ...] [DEPENDS ...] [DEFINITIONS ...]): adds tests to a program;
+# calmframe_test(host_test [LABELS threads] [COST 1] SOURCES ... [LINKS ...] [DEPENDS ...] [DEFINITIONS ...]): adds tests to a program;
 # folders that link alike share one. Every suite of a program is a test of ctest, "host_test.FrameCacheTest".
+# Suites of a greater COST are run first: what takes minutes does not begin when all else is done.
 # LABELS threads: what the thread sanitizer runs, built by the target thread_tests. The reference loops of most tests are
 # short, so these programs are built quickly rather than to be quick; a source with long loops says so itself. Building them
 # is a third of a check: several sources are compiled as one, and undefined behaviour is looked for in what they test.
@@ -50,15 +51,18 @@ if(CALMFRAME_SANITIZE MATCHES "undefined")
   list(APPEND test_options -fno-sanitize=undefined)
 endif()
 function(calmframe_test name)
-  cmake_parse_arguments(ARG "" "LABELS" "SOURCES;LINKS;DEPENDS;DEFINITIONS" ${ARGN})
+  cmake_parse_arguments(ARG "" "LABELS;COST" "SOURCES;LINKS;DEPENDS;DEFINITIONS" ${ARGN})
   if(NOT TARGET ${name})
     calmframe_program(${name} SOURCES ${ARG_SOURCES} LINKS ${ARG_LINKS} GTest::gmock GTest::gtest_main)
     target_compile_options(${name} PRIVATE ${test_options})
     set_target_properties(${name} PROPERTIES UNITY_BUILD ON)
     target_precompile_headers(${name} REUSE_FROM test_headers)
     set(list "${CMAKE_BINARY_DIR}/suites/${name}.cmake")
+    if(NOT ARG_COST)
+      set(ARG_COST 0)
+    endif()
     add_custom_command(TARGET ${name} POST_BUILD
-      COMMAND "${CMAKE_COMMAND}" -DPROGRAM=$<TARGET_FILE:${name}> -DNAME=${name} -DLABELS=${ARG_LABELS} -DLIST=${list}
+      COMMAND "${CMAKE_COMMAND}" -DPROGRAM=$<TARGET_FILE:${name}> -DNAME=${name} -DLABELS=${ARG_LABELS} -DCOST=${ARG_COST} -DLIST=${list}
         -P "${CMAKE_SOURCE_DIR}/cmake/ListSuites.cmake"
       BYPRODUCTS "${list}" VERBATIM)
     # A program that was not built has no list, and its absence must show.
