@@ -92,8 +92,9 @@ void AddChoice(const host::Choice& choice, Page& page) {
   page.shown.words.push_back(RuleText());
   page.shown.words.push_back(MeaningText(choice));
   MarkedTable& ways = page.shown.ways;
-  ways.columns = {"Way",   "Width kept",      "Greatest zoom", "Black at most",
-                  "Shake", "Shake of tracks", "Wobble",        "Cost, dB"};
+  ways.columns = {"Way",           "Width kept",  "Greatest zoom",
+                  "Black at most", "Shake",       "Shake of tracks",
+                  "Wobble",        "Off the aim", "Cost, dB"};
   ways.marked = choice.taken;
   ways.mark = "chosen";
   page.shown.scatter = {"ways",
@@ -105,10 +106,11 @@ void AddChoice(const host::Choice& choice, Page& page) {
                         {}};
   for (const host::Candidate& candidate : choice.candidates) {
     const host::Outcome& of = candidate.outcome;
-    ways.rows.push_back(
-        {candidate.name, Fixed(100 * of.width_kept, 1) + " %", Fixed(of.most_zoom, 2),
-         Fixed(100 * of.most_black, 1) + " %", Fixed(of.after.mean, 2), Fixed(of.tracks_after, 2),
-         Fixed(of.wobble_after, 2), candidate.follows ? Fixed(candidate.cost, 2) : "–"});
+    ways.rows.push_back({candidate.name, Fixed(100 * of.width_kept, 1) + " %",
+                         Fixed(of.most_zoom, 2), Fixed(100 * of.most_black, 1) + " %",
+                         Fixed(of.after.mean, 2), Fixed(of.tracks_after, 2),
+                         Fixed(of.wobble_after, 2), Fixed(of.straying.mean, 1),
+                         candidate.follows ? Fixed(candidate.cost, 2) : "–"});
     constexpr double kUnseen = 0.05;  // per mille; what has less lies there too
     page.shown.scatter.dots.push_back({candidate.name, 100 * of.width_kept,
                                        std::max(of.after.mean, kUnseen),

@@ -138,6 +138,7 @@ ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
   shown.width = clip.width;
   shown.height = clip.height;
   shown.paths = motion.paths;
+  const double square = (clip.width - 1.0) / (clip.source_width - 1.0);
   std::vector<Similarity> to_outputs;
   Similarity before;
   std::vector<Point> in_output;
@@ -158,6 +159,8 @@ ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
       shown.uncovered.push_back(UncoveredShare({in_output.data(), warp.columns, warp.rows},
                                                clip.width - 1.0, clip.height - 1.0));
     }
+    const Point aim = plane.SourceAt(f, window({}));
+    shown.aims.push_back({aim.x * square - middle.x, aim.y - middle.y});
     before = window;
     to_outputs.push_back(to_output);
   }
@@ -177,7 +180,8 @@ ShownMotion MotionOfSource(const SolvedClip& clip, const PictureMotion& motion) 
           std::vector<double>(frames, 1.0),
           std::vector<double>(frames, 0.0),
           motion.wobble,
-          motion.paths};
+          motion.paths,
+          std::vector<Point>(frames)};
 }
 
 }  // namespace calmframe::host

@@ -29,6 +29,27 @@ std::ptrdiff_t ReachOf(std::ptrdiff_t frames, double frames_per_second) {
   return frames < 2 * reach + 1 ? std::max<std::ptrdiff_t>(2, (frames - 1) / 2) : reach;
 }
 
+struct WorstSecond {
+  double mean = 0;    // the greatest of a second's values; 0 where none is above
+  double middle = 0;  // of that second, in values from the first
+};
+
+WorstSecond FindWorstSecond(const std::vector<double>& values, double frames_per_second) {
+  WorstSecond worst;
+  const auto second = std::clamp<std::size_t>(
+      static_cast<std::size_t>(std::lround(frames_per_second)), 1, values.size());
+  double sum = 0;
+  for (std::size_t f = 0; f < values.size(); ++f) {
+    sum += values[f];
+    if (f + 1 < second) continue;
+    if (f >= second) sum -= values[f - second];
+    const double mean = sum / static_cast<double>(second);
+    if (mean <= worst.mean) continue;
+    worst = {mean, static_cast<double>(f) - static_cast<double>(second - 1) / 2};
+  }
+  return worst;
+}
+
 }  // namespace
 
 Shake MeasureShake(const ShownMotion& shown, double frames_per_second) {
@@ -63,24 +84,41 @@ Shake MeasureShake(const ShownMotion& shown, double frames_per_second) {
     shakes.push_back(*middle);
   }
   Shake shake;
-  const auto second = std::clamp<std::size_t>(
-      static_cast<std::size_t>(std::lround(frames_per_second)), 1, shakes.size());
-  double sum = 0;
-  for (std::size_t f = 0; f < shakes.size(); ++f) {
-    shake.mean += shakes[f] / static_cast<double>(shakes.size());
-    sum += shakes[f];
-    if (f + 1 < second) continue;
-    if (f >= second) sum -= shakes[f - second];
-    const double mean = sum / static_cast<double>(second);
-    if (mean <= shake.worst) continue;
-    shake.worst = mean;
-    shake.worst_at = (static_cast<double>(f + static_cast<std::size_t>(reach)) -
-                      static_cast<double>(second - 1) / 2) /
-                     frames_per_second;
+  for (const double value : shakes) shake.mean += value / static_cast<double>(shakes.size());
+  const WorstSecond worst = FindWorstSecond(shakes, frames_per_second);
+  shake.worst = worst.mean;
+  if (worst.mean > 0) {
+    shake.worst_at = (worst.middle + static_cast<double>(reach)) / frames_per_second;
   }
   std::sort(shakes.begin(), shakes.end());
   shake.p95 = shakes[std::min(shakes.size() - 1, shakes.size() * 19 / 20)];
   return shake;
+}
+
+Straying MeasureStraying(const ShownMotion& shown, double frames_per_second) {
+  const auto frames = static_cast<std::ptrdiff_t>(shown.aims.size());
+  const std::ptrdiff_t reach = ReachOf(frames, frames_per_second);
+  if (frames < 2 * reach + 1) return {};
+  const std::vector<double> weights = ParabolaWeights(reach);
+  std::vector<Point> aims = shown.aims;
+  Point last;
+  for (Point& aim : aims) {
+    if (!std::isfinite(aim.x) || !std::isfinite(aim.y)) aim = last;
+    last = aim;
+  }
+  Straying straying;
+  std::vector<double> away(static_cast<std::size_t>(frames - 2 * reach));
+  for (std::size_t f = 0; f < away.size(); ++f) {
+    Point calm;
+    for (std::size_t i = 0; i < weights.size(); ++i) {
+      calm.x += weights[i] * aims[f + i].x;
+      calm.y += weights[i] * aims[f + i].y;
+    }
+    away[f] = std::hypot(calm.x, calm.y) * 1000 / shown.width;
+    straying.mean += away[f] / static_cast<double>(away.size());
+  }
+  straying.worst = FindWorstSecond(away, frames_per_second).mean;
+  return straying;
 }
 
 double MeasureWobble(const ShownMotion& shown) {

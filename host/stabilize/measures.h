@@ -16,6 +16,9 @@ struct ShownMotion {
   std::vector<double> uncovered;  // share of each frame where the source shows nothing, 0 to 1
   std::vector<double> wobble;     // pixels of the output; see PictureMotion
   std::vector<TrackPath> paths;   // of the tracks in the output
+  // What each frame shows in its middle: square pixels of the source about the frame's own middle,
+  // where the camera was pointed. No number where the frame's warp is folded.
+  std::vector<Point> aims;
 };
 
 // Motion that is faster than about 0.9 Hz, in pixels of a picture 1000 wide: how far the path of
@@ -29,6 +32,15 @@ struct Shake {
   double worst_at = 0;  // its middle, in seconds from the first frame
 };
 Shake MeasureShake(const ShownMotion& shown, double frames_per_second);
+
+// How far what is shown leaves what the camera was pointed at, in thousandths of the width: a pan
+// that comes late, or goes on too far. Both ends of it without what MeasureShake takes for shake;
+// the turn and the zoom don't count. All 0 for clips of fewer than five frames.
+struct Straying {
+  double mean = 0;   // over the frames
+  double worst = 0;  // mean of the worst second
+};
+Straying MeasureStraying(const ShownMotion& shown, double frames_per_second);
 
 // Mean over the frames of which it can be told, in thousandths of the width.
 double MeasureWobble(const ShownMotion& shown);

@@ -63,6 +63,8 @@ nlohmann::ordered_json Outcome::Json() const {
   object["tracks_after"] = Rounded(tracks_after);
   object["wobble_before"] = Rounded(wobble_before);
   object["wobble_after"] = Rounded(wobble_after);
+  object["straying"] = Rounded(straying.mean);
+  object["worst_straying"] = Rounded(straying.worst);
   return object;
 }
 
@@ -85,6 +87,9 @@ Outcome Outcome::Parse(const nlohmann::json& object) {
                                     {"wobble_after", &outcome.wobble_after}}) {
     *value = object.at(name).get<double>();
   }
+  // Choices that were saved before it was measured lack it.
+  outcome.straying.mean = object.value("straying", 0.0);
+  outcome.straying.worst = object.value("worst_straying", 0.0);
   return outcome;
 }
 
@@ -115,6 +120,8 @@ Outcome OutcomeOf(const std::vector<ShotOutcome>& shots) {
     film.tracks_after += share * own.tracks_after;
     film.wobble_before += share * own.wobble_before;
     film.wobble_after += share * own.wobble_after;
+    film.straying.mean += share * own.straying.mean;
+    film.straying.worst = std::max(film.straying.worst, own.straying.worst);
   }
   return film;
 }
@@ -128,6 +135,7 @@ Outcome MeasureOutcome(const ShownMotion& source, const ShownMotion& shown,
   outcome.tracks_before = MeasureTrackShake(source, frames_per_second);
   outcome.tracks_after = MeasureTrackShake(shown, frames_per_second);
   outcome.wobble_after = MeasureWobble(shown);
+  outcome.straying = MeasureStraying(shown, frames_per_second);
   outcome.width_kept = 0;
   for (std::size_t f = 0; f < shown.zooms.size(); ++f) {
     outcome.width_kept += 1 / shown.zooms[f] / static_cast<double>(shown.zooms.size());

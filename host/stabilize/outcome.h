@@ -21,6 +21,7 @@ struct Outcome {
   Shake before, after;                         // of the source, and of this
   double wobble_before = 0, wobble_after = 0;  // see MeasureWobble
   double tracks_before = 0, tracks_after = 0;  // see MeasureTrackShake
+  Straying straying;                           // of this from what the camera was pointed at
 
   // By how much the mean shake has fallen; what nobody sees counts as as little.
   double decibels() const;

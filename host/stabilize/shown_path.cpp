@@ -8,8 +8,8 @@
 namespace calmframe::host {
 namespace {
 
-std::vector<WindowPlace> PlacesOf(const WarpedPlane& plane,
-                                  const std::vector<Similarity>& windows) {
+std::vector<WindowPlace> PlacesOf(const WarpedPlane& plane, const std::vector<Similarity>& windows,
+                                  const std::vector<Point>& aims) {
   const SolvedClip& clip = plane.clip();
   const Point middle = Middle(clip);
   const double width = clip.width - 1.0, height = clip.height - 1.0;
@@ -23,7 +23,7 @@ std::vector<WindowPlace> PlacesOf(const WarpedPlane& plane,
       return Point{source.x * square - middle.x, source.y - middle.y};
     };
     WindowPlace place;
-    place.centre = in_source(middle);
+    place.centre = aims[f];
     Point first = place.centre, last = place.centre;
     for (const Point& corner : {Point{}, Point{width, 0}, Point{0, height}, Point{width, height}}) {
       const Point at = in_source(corner);
@@ -45,7 +45,7 @@ ShownPath PathShown(const SolvedClip& clip, Warps warps, const std::vector<Simil
   ShownPath path;
   path.source = MotionOfSource(clip, source);
   path.output = MotionShown(plane, warps == Warps::none ? source : FindMotion(plane), windows);
-  path.windows = PlacesOf(plane, windows);
+  path.windows = PlacesOf(plane, windows, path.output.aims);
   return path;
 }
 

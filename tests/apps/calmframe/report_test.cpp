@@ -134,7 +134,7 @@ TEST_F(ReportTest, ShowsWhatStabilizeShowsAndWhy) {
   for (const auto& candidate : choice.at("candidates")) {
     const auto name = candidate.at("name").get<std::string>();
     auto row = RowOf(page, name);
-    ASSERT_EQ(row.size(), 7u) << name;
+    ASSERT_EQ(row.size(), 8u) << name;
     const auto told = [&](const char* column) { return std::stod(row[column]); };
     EXPECT_NEAR(told("Width kept"), 100 * candidate.at("width_kept").get<double>(), 0.06) << name;
     EXPECT_NEAR(told("Greatest zoom"), candidate.at("most_zoom"), 0.006) << name;
@@ -142,6 +142,7 @@ TEST_F(ReportTest, ShowsWhatStabilizeShowsAndWhy) {
     EXPECT_NEAR(told("Shake"), candidate.at("shake_after"), 0.006) << name;
     EXPECT_NEAR(told("Shake of tracks"), candidate.at("tracks_after"), 0.006) << name;
     EXPECT_NEAR(told("Wobble"), candidate.at("wobble_after"), 0.006) << name;
+    EXPECT_NEAR(told("Off the aim"), candidate.at("straying"), 0.06) << name;
     if (name == "as filmed") {
       EXPECT_EQ(row["Cost, dB"], "–") << "it is not weighed by it";
     } else {

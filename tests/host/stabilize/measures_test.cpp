@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <functional>
 #include <numbers>
@@ -13,7 +14,7 @@ constexpr double kRate = 30, kWidth = 500;
 
 // Ten seconds in which the background's place is at(seconds), in pixels.
 ShownMotion Moving(const std::function<double(double)>& at) {
-  ShownMotion shown{kWidth, 300, {}, {}, {}, {}, {}};
+  ShownMotion shown{kWidth, 300, {}, {}, {}, {}, {}, {}};
   for (int f = 0; f < 300; ++f) {
     shown.motions.push_back({1, 0, at((f - 1) / kRate) - at(f / kRate), 0});
   }
@@ -47,7 +48,7 @@ TEST(MeasureShakeTest, FindsTheWorstSecond) {
 // A turn about the middle moves most places, and so does a change of scale.
 TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
   for (const bool turns : {true, false}) {
-    ShownMotion shown{kWidth, 300, {}, {}, {}, {}, {}};
+    ShownMotion shown{kWidth, 300, {}, {}, {}, {}, {}, {}};
     for (int f = 0; f < 300; ++f) {
       const double step = 0.01 * (f % 2 == 0 ? 1 : -1);
       shown.motions.push_back(turns ? Similarity{1, step, 0, 0} : Similarity{1 + step, 0, 0, 0});
@@ -60,7 +61,7 @@ TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
 // Of three tracks that sway the one in the middle counts; one that is too short, and frames near a
 // track's ends, don't.
 TEST(MeasureTrackShakeTest, TakesTheMedianOfTracksThatLast) {
-  ShownMotion shown{kWidth, 300, std::vector<Similarity>(300), {}, {}, {}, {}};
+  ShownMotion shown{kWidth, 300, std::vector<Similarity>(300), {}, {}, {}, {}, {}};
   for (const double height : {1.0, 4.0, 50.0}) {
     TrackPath path{40, {}};
     for (int i = 0; i < 200; ++i) path.points.push_back({3.0 * i, height * Wave(11.3, i / kRate)});
@@ -71,8 +72,27 @@ TEST(MeasureTrackShakeTest, TakesTheMedianOfTracksThatLast) {
   EXPECT_EQ(MeasureTrackShake(shown, kRate), 0);
 }
 
+// A pan that comes a second late, of 60 pixels in two seconds: by 30 at most, 60 thousandths of the
+// width. What is faster than the parabola's reach is no straying, and a frame without a place has
+// the one before.
+TEST(MeasureStrayingTest, APanThatLagsStrays) {
+  const auto strays = [](const std::function<double(double)>& at) {
+    ShownMotion shown{kWidth, 300, {}, {}, {}, {}, {}, {}};
+    for (int f = 0; f < 300; ++f) shown.aims.push_back({at(f / kRate), 0});
+    shown.aims[20] = {std::nan(""), std::nan("")};
+    return MeasureStraying(shown, kRate);
+  };
+  const auto pan = [](double s) { return 30 * std::clamp(s - 4, 0.0, 2.0); };
+  const Straying late = strays([&](double s) { return pan(s - 1) - pan(s); });
+  // It lags for three seconds, a mean of 20 pixels; 1.2 of the ten seconds are not measured.
+  EXPECT_NEAR(late.mean, 20 * 2 * 3 / 8.8, 0.3);
+  EXPECT_NEAR(late.worst, 60, 3);
+  EXPECT_NEAR(strays([](double) { return -9; }).mean, 18, 1e-9);
+  EXPECT_LT(strays([](double s) { return 9 * Wave(8, s); }).worst, 2.5);
+}
+
 TEST(MeasureShakeTest, AFewFramesHaveNone) {
-  ShownMotion shown{kWidth, 300, std::vector<Similarity>(4, Similarity{1, 0, 9, 0}), {}, {},
+  ShownMotion shown{kWidth, 300, std::vector<Similarity>(4, Similarity{1, 0, 9, 0}), {}, {}, {},
                     {},     {}};
   EXPECT_EQ(MeasureShake(shown, kRate).mean, 0);
   shown.motions.clear();
