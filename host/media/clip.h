@@ -152,6 +152,7 @@ struct EncodeSettings {
   // they have not is a warning.
   std::string pixel_format;
   bool overwrite = false;
+  bool video_alone = false;  // nothing of the source's other streams, chapters and tags
 };
 
 // Writes a clip beside the source's other streams; of a part what lies within it, by whole packets:

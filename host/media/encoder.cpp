@@ -29,14 +29,13 @@ std::vector<std::string> EncoderNames() {
   return names;
 }
 
-// Containers that state one frame rate in place of a time for each frame.
+}  // namespace
+
 bool HasOneRate(const AVOutputFormat& format) {
   if (format.flags & AVFMT_NOTIMESTAMPS) return true;
   const std::string name = format.name;
   return name == "avi" || name == "dv" || name == "gxf" || name == "swf" || name == "yuv4mpegpipe";
 }
-
-}  // namespace
 
 const AVOutputFormat* FormatForPipe(const EncodeSettings& settings) {
   const auto named = [](const char* name) { return av_guess_format(name, nullptr, nullptr); };

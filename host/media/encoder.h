@@ -14,6 +14,9 @@ namespace calmframe::media {
 // NUT where that doesn't take it.
 const AVOutputFormat* FormatForPipe(const EncodeSettings& settings);
 
+// Containers that state one frame rate in place of a time for each frame.
+bool HasOneRate(const AVOutputFormat& format);
+
 // The video encoder of a written clip, and the clock of its packets.
 class Encoder {
  public:

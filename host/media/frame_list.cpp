@@ -1,6 +1,8 @@
 #include "host/media/frame_list.h"
 
 #include <algorithm>
+#include <cstddef>
+#include <utility>
 
 #include "platform/tessel/filesupport.h"
 #include "platform/tessel/utility.h"
@@ -211,6 +213,26 @@ std::optional<FrameList> FrameListOf(const std::vector<std::uint8_t>& bytes,
   return list;
 } catch (const StreamError&) {
   return {};
+}
+
+std::vector<std::uint8_t> JoinFound(const std::vector<std::vector<std::uint8_t>>& stretches) {
+  std::optional<FrameList> whole;
+  for (const std::vector<std::uint8_t>& bytes : stretches) {
+    std::optional<FrameList> next = FrameListOf(bytes, "");
+    if (!next) break;
+    if (!whole) {
+      whole = std::move(next);
+      continue;
+    }
+    if (next->info != whole->info) return {};
+    if (next->known.first > whole->known.end) break;
+    if (next->known.end <= whole->known.end) continue;
+    std::copy(next->index.begin() + static_cast<std::ptrdiff_t>(whole->known.end),
+              next->index.begin() + static_cast<std::ptrdiff_t>(next->known.end),
+              whole->index.begin() + static_cast<std::ptrdiff_t>(whole->known.end));
+    whole->known.end = next->known.end;
+  }
+  return whole ? whole->Bytes() : std::vector<std::uint8_t>();
 }
 
 }  // namespace calmframe::media

@@ -27,4 +27,9 @@ struct FrameList final : FoundFrames {
 std::optional<FrameList> FrameListOf(const std::vector<std::uint8_t>& bytes,
                                      const std::string& path);
 
+// What was found of stretches of a clip, as one: the Bytes of each, in ascending order, as far as
+// they go on where the one before them ends. Empty where the first of them is no list, or one is of
+// another clip.
+std::vector<std::uint8_t> JoinFound(const std::vector<std::vector<std::uint8_t>>& stretches);
+
 }  // namespace calmframe::media

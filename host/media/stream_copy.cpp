@@ -14,15 +14,6 @@ constexpr std::int64_t kLongestSubtitle = 30 * std::int64_t{AV_TIME_BASE};
 // So far containers may lay the packets of one instant apart.
 constexpr std::int64_t kInterleaving = 10 * std::int64_t{AV_TIME_BASE};
 
-std::uint32_t TagFor(const AVOutputFormat& format, const AVCodecParameters& parameters) {
-  unsigned tag = 0;
-  const bool keeps =
-      !format.codec_tag ||
-      av_codec_get_id(format.codec_tag, parameters.codec_tag) == parameters.codec_id ||
-      !av_codec_get_tag2(format.codec_tag, parameters.codec_id, &tag);
-  return keeps ? parameters.codec_tag : 0;
-}
-
 void CopyTags(const AVDictionary* from, AVDictionary*& to) {
   if (av_dict_copy(&to, from, 0) < 0) throw std::bad_alloc();
 }
@@ -76,6 +67,15 @@ bool Takes(const AVOutputFormat& format, const AVStream& video, const AVStream& 
 }
 
 }  // namespace
+
+std::uint32_t TagFor(const AVOutputFormat& format, const AVCodecParameters& parameters) {
+  unsigned tag = 0;
+  const bool keeps =
+      !format.codec_tag ||
+      av_codec_get_id(format.codec_tag, parameters.codec_tag) == parameters.codec_id ||
+      !av_codec_get_tag2(format.codec_tag, parameters.codec_id, &tag);
+  return keeps ? parameters.codec_tag : 0;
+}
 
 StreamCopy::StreamCopy(const ClipInfo& source, const std::string& shown, AVFormatContext& output,
                        std::vector<std::string>& warnings)

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <map>
 #include <set>
 #include <string>
@@ -8,6 +9,10 @@
 #include "host/media/ffmpeg.h"
 
 namespace calmframe::media {
+
+// The tag of a stream's codec in another container: its own where that knows it, else 0, for the
+// muxer to find.
+std::uint32_t TagFor(const AVOutputFormat& format, const AVCodecParameters& parameters);
 
 // Everything of a source file but its steadied video stream, on its way into another file.
 class StreamCopy {
