@@ -31,15 +31,25 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
           "Prints the effect's own crop window and how far it is enlarged. What follows the "
           "picture "
           "in its place is found by stabilize, and shown by report. With --project, these and "
-          "render go on from there.",
+          "render go on from there.\n\n"
+          "A long film can be shared by several machines: each analyses some of its shots with "
+          "--from, --to and --choose, gather makes one project of theirs, each draws some frames "
+          "with render --segment, and join makes one file of them.",
           "Examples:\n"
           "  calmframe analyze shaky.mp4\n"
-          "  calmframe analyze shaky.mp4 --project shaky.calm --smoothness 20")) {
+          "  calmframe analyze shaky.mp4 --project shaky.calm --smoothness 20\n"
+          "  calmframe analyze hike.mp4 --choose --to 0:02 --project early.calm\n"
+          "  calmframe analyze hike.mp4 --choose --from 0:02 --project late.calm")) {
   AddFile(parser_, "IN", input_,
           "The shaky clip; - for a pipe, f%04d.png, a quoted glob or a folder for pictures");
   AddControlFlags(parser_, controls_);
   AddStretchFlags(parser_, stretch_, BareNumber::seconds);
   AddShotsFlag(parser_, shots_);
+  AddWindowFlags(parser_, window_);
+  PutInGroup("Window",
+             {AddSwitch(parser_, "--choose", chooses_,
+                        "Choose as stabilize does, and leave that in the project, too; a stretch "
+                        "that can't be solved is left to be drawn as it was filmed")});
   AddProjectFlag(parser_, project_);
   AddRunFlags(parser_, run_);
 }
@@ -58,10 +68,19 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
   std::vector<Analysed> shots;
   while (host::SteadyClip* const shot = NextShot(*film, controls_)) {
     progress.OfShot(film->number() > 0 ? film->number() + 1 : 0);
-    unsaved = WorkAndLeave(*film, *shot, project_, progress);
-    // The effect's own window is no trouble where it isn't what is shown.
-    const bool follows = host::Follows(*shot, {});
-    if (!follows) TellTrouble(host::CropTroubleOf(*shot), *shot, progress);
+    bool follows = true;
+    if (chooses_) {
+      const bool is_all = film->is_one_shot() && film->range().size() == film->whole().frame_count;
+      if (!WorkOrLeaveAsFilmed(*film, *shot, is_all, project_, window_, unsaved, progress)) {
+        shots.push_back({shot->range(), nullptr, ""});
+        continue;
+      }
+    } else {
+      unsaved = WorkAndLeave(*film, *shot, project_, progress);
+      // The effect's own window is no trouble where it isn't what is shown.
+      follows = host::Follows(*shot, {});
+      if (!follows) TellTrouble(host::CropTroubleOf(*shot), *shot, progress);
+    }
     shots.push_back({shot->range(), shot->Crop(),
                      shot->CropText() + (follows ? ", with --window steady" : "")});
   }

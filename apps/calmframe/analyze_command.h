@@ -25,6 +25,8 @@ class AnalyzeCommand final : public Command {
   Stretch stretch_;
   host::ShotRequest shots_;
   ControlFlags controls_;
+  host::WindowSettings window_;
+  bool chooses_ = false;
   RunFlags run_;
 };
 

@@ -19,24 +19,6 @@ media::FrameRange Common(const media::FrameRange& a, const media::FrameRange& b)
   return both.first < both.end ? both : media::FrameRange{both.first, both.first};
 }
 
-// Without the shot's work it is drawn as it was filmed, beside others that are steadied.
-bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, const std::string& project,
-                         const OutputFlags& flags, Unsaved& unsaved, ProgressLine& progress) {
-  const auto work = [&] {
-    unsaved = WorkAndLeave(film, shot, project, progress);
-    Frame(shot, flags.window, progress);
-    if (shot.has_new_choice()) unsaved = Leave(film, project);
-  };
-  try {
-    work();
-  } catch (const SolveFailure& failure) {
-    if (film.is_one_shot()) throw;
-    progress.Warn(std::string(failure.what()) + "; the shot stays as it was filmed");
-    return false;
-  }
-  return true;
-}
-
 std::vector<std::string> Listed(const std::string& text) {
   std::vector<std::string> items;
   std::stringstream stream(text);
@@ -109,6 +91,25 @@ host::SteadyClip& SavedShotOf(host::Film& film, const std::string& project, int 
   return *film.Open(static_cast<std::size_t>(shot) - 1);
 }
 
+bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
+                         const std::string& project, const host::WindowSettings& window,
+                         Unsaved& unsaved, ProgressLine& progress) {
+  const auto work = [&] {
+    unsaved = WorkAndLeave(film, shot, project, progress);
+    Frame(shot, window, progress);
+    if (shot.has_new_choice()) unsaved = Leave(film, project);
+  };
+  try {
+    work();
+  } catch (const SolveFailure& failure) {
+    if (is_all) throw;
+    progress.Warn(std::string(failure.what()) + "; the shot stays as it was filmed");
+    unsaved = Leave(film, project);  // as it is, so that those behind it keep their places
+    return false;
+  }
+  return true;
+}
+
 void FilmOutcome::Add(host::SteadyClip& shot) {
   Told told{shot.range(), {}, "", nlohmann::ordered_json::object()};
   // That leaves what it leaves.
@@ -165,7 +166,8 @@ void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::stri
     if (shot->range().first >= part.end) break;
     if (is_known && Common(part, shot->range()).size() == 0) continue;
     progress.OfShot(film.number() > 0 ? film.number() + 1 : 0);
-    const bool steadied = WorkOrLeaveAsFilmed(film, *shot, project, flags, unsaved, progress);
+    const bool steadied = WorkOrLeaveAsFilmed(film, *shot, film.is_one_shot(), project,
+                                              flags.window, unsaved, progress);
     const media::FrameRange frames = Common(part, shot->range());
     if (frames.size() == 0) continue;
     const std::size_t first = shot->range().first;

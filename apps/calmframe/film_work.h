@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "apps/calmframe/controls.h"
+#include "apps/calmframe/project_work.h"
 #include "apps/calmframe/stabilize_command.h"
 #include "host/stabilize/film.h"
 
@@ -16,6 +17,13 @@ void AddShotsFlag(CLI::App& command, host::ShotRequest& shots);
 void AddShotFlag(CLI::App& command, int& shot);
 // Opens that one. Throws UsageFailure where there is none.
 host::SteadyClip& SavedShotOf(host::Film& film, const std::string& project, int shot);
+
+// Works and frames the film's open shot, and leaves it in the project, as WorkAndLeave does. One
+// that can't be solved stays as it was filmed, with a warning; then false. Not so where it `is_all`
+// there is: throws SolveFailure. Throws as SteadyFilm.
+bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
+                         const std::string& project, const host::WindowSettings& window,
+                         Unsaved& unsaved, ProgressLine& progress);
 
 // What a film's shots show, told behind all else that a run says.
 class FilmOutcome {

@@ -69,6 +69,14 @@ CLI::Option* AddFile(CLI::App& command, const std::string& name, std::string& pa
       ->required(need == Need::required);
 }
 
+CLI::Option* AddFiles(CLI::App& command, const std::string& name, std::vector<std::string>& paths,
+                      const std::string& description) {
+  return command.add_option(name, paths, description)
+      ->type_name("FILE")
+      ->required()
+      ->expected(1, -1);
+}
+
 CLI::Option* AddFolder(CLI::App& command, const std::string& name, std::string& path,
                        const std::string& description) {
   return command.add_option(name, path, description)->type_name("DIR")->capture_default_str();

@@ -44,6 +44,10 @@ enum class Need { optional, required };
 CLI::Option* AddFile(CLI::App& command, const std::string& name, std::string& path,
                      const std::string& description, Need need = Need::required);
 
+// A place on the command line that takes one name of a file or more, with all that is left.
+CLI::Option* AddFiles(CLI::App& command, const std::string& name, std::vector<std::string>& paths,
+                      const std::string& description);
+
 // A place that takes a folder's name; `path` holds the one that is taken without.
 CLI::Option* AddFolder(CLI::App& command, const std::string& name, std::string& path,
                        const std::string& description);

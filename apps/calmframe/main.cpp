@@ -29,6 +29,7 @@
 #include "apps/calmframe/project_commands.h"
 #include "apps/calmframe/report_command.h"
 #include "apps/calmframe/shots_command.h"
+#include "apps/calmframe/split_commands.h"
 #include "apps/calmframe/stabilize_command.h"
 #include "host/base/nearest_match.h"
 #include "host/media/clip.h"
@@ -163,7 +164,9 @@ int Run(int argc, char** argv) {
   AnalyzeCommand analyze(program);
   ParamsCommand params(program);
   ShotsCommand shots(program);
+  GatherCommand gather(program);
   RenderCommand render(program);
+  JoinCommand join(program);
   InfoCommand info(program);
   TracksCommand tracks(program);
   ReportCommand report(program);
@@ -173,8 +176,9 @@ int Run(int argc, char** argv) {
   WriteCommand bash(program, "write-bash-completion", manual::BashCompletion);
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
-  Command* const commands[] = {&stabilize, &demo,   &analyze,  &params, &shots, &render, &info,
-                               &tracks,    &report, &man_page, &bash,   &zsh,   &fish};
+  Command* const commands[] = {&stabilize, &demo,     &analyze, &params, &shots,
+                               &render,    &info,     &tracks,  &report, &gather,
+                               &join,      &man_page, &bash,    &zsh,    &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;

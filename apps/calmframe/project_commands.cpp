@@ -34,7 +34,9 @@ RenderCommand::RenderCommand(CLI::App& program)
           "count in the clip, as for stabilize; but a whole number alone is a frame.",
           "Examples:\n"
           "  calmframe render --project shaky.calm steady.mp4\n"
-          "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20")) {
+          "  calmframe render --project shaky.calm look.mp4 --from 10 --to 20\n"
+          "  calmframe render --project whole.calm early.mkv --to 60 --segment\n"
+          "  calmframe render --project whole.calm late.mkv --from 60 --segment")) {
   AddFile(parser_, "OUT", output_,
           "The steady clip to write; - for a pipe: raw frames, or Matroska with --codec; "
           "f%04d.png or a folder with / for pictures");
@@ -42,6 +44,8 @@ RenderCommand::RenderCommand(CLI::App& program)
   AddStretchFlags(parser_, stretch_, BareNumber::frame);
   AddOutputFlags(parser_, flags_);
   AddSideBySideFlag(parser_, flags_);
+  PutInGroup("Output", {AddSwitch(parser_, "--segment", flags_.encode.video_alone,
+                                  "The pictures alone, without sound and all else, for join")});
   AddRunFlags(parser_, run_);
 }
 
