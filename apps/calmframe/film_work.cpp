@@ -104,6 +104,7 @@ bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
   } catch (const SolveFailure& failure) {
     if (is_all) throw;
     progress.Warn(std::string(failure.what()) + "; the shot stays as it was filmed");
+    shot.ShowAsFilmed(progress);
     unsaved = Leave(film, project);  // as it is, so that those behind it keep their places
     return false;
   }
@@ -111,7 +112,7 @@ bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
 }
 
 void FilmOutcome::Add(host::SteadyClip& shot) {
-  Told told{shot.range(), {}, "", nlohmann::ordered_json::object()};
+  Told told{film_.number() + 1, shot.range(), {}, "", nlohmann::ordered_json::object()};
   // That leaves what it leaves.
   if (shot.ValueOf(HX_FRAMING.disk_id) != host::kStabilizeOnly) {
     told.outcome.outcome = shot.Measure();
@@ -141,7 +142,7 @@ void FilmOutcome::Tell(ProgressLine& progress) const {
     object.update(told.object);
     list.push_back(object);
     if (shots_.size() < 2) continue;
-    progress.OfShot(s + 1);
+    progress.OfShot(told.number);
     progress.Note(TimeText(film_.whole(), told.range.first) + " to " +
                   TimeText(film_.whole(), told.range.end) + ", " + told.line);
   }

@@ -35,6 +35,7 @@ class FilmOutcome {
 
  private:
   struct Told {
+    std::size_t number = 0;  // of the shot, from 1
     media::FrameRange range;
     host::ShotOutcome outcome;
     std::string line;

@@ -479,7 +479,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   if (stands) {
     Chooser chooser(solved, settings);
     chooser.Take(*choice_, solved);
-    return Draw(*choice_, chooser.windows(), std::move(saved), watcher);
+    return Draw(choice_->best(), chooser.windows(), std::move(saved), watcher);
   }
   const bool as_set = !request.may_choose && request.still == Still::automatic;
   Still still = as_set ? Still::all : request.still;
@@ -522,7 +522,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   progress.ends = true;
   watcher.Show(progress);
   if (!choice_->best().changes.empty()) Solved(*effect_, &saved, path());
-  Draw(*choice_, chooser.windows(), std::move(saved), watcher);
+  Draw(choice_->best(), chooser.windows(), std::move(saved), watcher);
 }
 
 Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watcher& watcher) {
@@ -585,11 +585,21 @@ void SteadyClip::BecomeCopy(Effect& copy, Watcher& watcher) {
   CheckResult(unseen);
 }
 
-void SteadyClip::Draw(const Choice& choice, const std::vector<Similarity>& windows,
+void SteadyClip::ShowAsFilmed(Watcher& watcher) {
+  DrawByItself();
+  choice_.reset();
+  if (Session::StatusOf(*effect_) != kReady) return;  // then the effect passes them through
+  SavedEffect saved;
+  const SolvedClip solved = Solved(*effect_, &saved, path());
+  Draw({.name = "as filmed", .warps = Warps::none, .follows = false}, WholeFrames(solved),
+       std::move(saved), watcher);
+}
+
+void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& windows,
                       SavedEffect saved, Watcher& watcher) {
-  const bool fills = choice.best().follows && ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
-  saved.instance = WithWindows(saved.instance, windows, choice.best().warps,
-                               fills ? PlacedBy::bounds : PlacedBy::crop);
+  const bool fills = shown.follows && ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
+  saved.instance =
+      WithWindows(saved.instance, windows, shown.warps, fills ? PlacedBy::bounds : PlacedBy::crop);
   // Of a clip as it was filmed nothing is feathered and filled.
   if (!fills && !Crops(ValueOf(HX_FRAMING.disk_id))) {
     saved.values[HX_FRAMING.disk_id] = kStabilizeOnly;
@@ -610,7 +620,7 @@ void SteadyClip::DrawByItself() {
 }
 
 Outcome SteadyClip::Measure() {
-  if (drawn_) return choice_->best().outcome;
+  if (drawn_ && choice_) return choice_->best().outcome;
   const SolvedClip solved = SolvedAndFramed();
   const double zoom = Zoom(solved);
   const WarpedPlane plane(solved, Warps::solved), rest(solved, Warps::none);
@@ -628,10 +638,12 @@ Outcome SteadyClip::Measure() {
 
 ShownPath SteadyClip::Path() {
   const SolvedClip solved = SolvedAndFramed();
-  ShownPath path = drawn_ ? PathShown(solved, choice_->best().warps, windows_)
-                          : PathShown(solved, Warps::solved, OwnWindows(solved, Zoom(solved)));
-  path.most_zoom = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100 *
-                   (drawn_ ? choice_->most_zoom : ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100);
+  ShownPath path = drawn_ && choice_
+                       ? PathShown(solved, choice_->best().warps, windows_)
+                       : PathShown(solved, Warps::solved, OwnWindows(solved, Zoom(solved)));
+  path.most_zoom =
+      ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100 *
+      (drawn_ && choice_ ? choice_->most_zoom : ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100);
   return path;
 }
 

@@ -117,6 +117,10 @@ class SteadyClip {
   // After Work: solves anew without the tracks of the background or the subject, or with all, as
   // where there is no subject. Automatic leaves them as they are. Throws as Work.
   void HoldStill(Still still, Watcher& watcher);
+  // From now on the frames are drawn as they were filmed, whatever the framing: of a clip that was
+  // not solved, or of which nothing would be seen. It is no choice, and is not saved. Throws
+  // Interrupted, SolveFailure.
+  void ShowAsFilmed(Watcher& watcher);
   // Null where nothing was to choose.
   const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }
   // Made by FollowPicture since it was opened or saved.
@@ -178,7 +182,7 @@ class SteadyClip {
   Effect* TryControls(const SavedEffect& saved, Chooser& chooser, Watcher& watcher);
   // Goes on with a copy that was solved under other controls.
   void BecomeCopy(Effect& copy, Watcher& watcher);
-  void Draw(const Choice& choice, const std::vector<Similarity>& windows, SavedEffect saved,
+  void Draw(const Candidate& shown, const std::vector<Similarity>& windows, SavedEffect saved,
             Watcher& watcher);
   void DrawByItself();
   double FramesPerSecond() const;  // fields, of an interlaced clip

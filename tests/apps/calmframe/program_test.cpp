@@ -219,6 +219,16 @@ TEST_F(ProgramTest, AClipOfWhichNothingStaysInViewIsRefused) {
   ExpectLine("report p.calm p.html --quiet", 0, "no part of the");
   EXPECT_THAT(Content("p.html"), HasSubstr("Not steadied: nothing stays in view"));
   RunWell("analyze in.mkv --project p.calm --quiet --framing synthesize-edges");
+  // Beside another shot it comes out as it was filmed.
+  const std::string film = "stabilize in.mkv out.mkv --result no-motion --shots 4f --codec ffv1 ";
+  EXPECT_THAT(RunWell(film + "--quiet"), HasSubstr("shot 2: in.mkv: no part of the picture stays"));
+  const auto in = ClipReader::Open(Path("in.mkv")), out = ClipReader::Open(Path("out.mkv"));
+  for (const int frame : {4, 23}) {
+    double off = 0;
+    const auto a = ReadFrame(*in, frame), b = ReadFrame(*out, frame);
+    for (std::size_t i = 0; i < a.size(); ++i) off += std::abs(a[i].green - b[i].green);
+    EXPECT_LT(off / static_cast<double>(a.size()), 1.5) << frame;  // rounded to YUV twice
+  }
 }
 
 TEST_F(ProgramTest, ABannerIsToldInALineAndDrawnWhereItIsAskedFor) {
