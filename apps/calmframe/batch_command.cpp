@@ -3,6 +3,7 @@
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <cstdio>
+#include <cstdlib>
 #include <filesystem>
 #include <nlohmann/json.hpp>
 #include <system_error>
@@ -19,6 +20,7 @@
 #include "host/batch/local_batch.h"
 #include "host/batch/machine.h"
 #include "host/batch/plan.h"
+#include "host/batch/slurm_batch.h"
 #include "host/effects/host.h"
 
 namespace calmframe {
@@ -107,6 +109,21 @@ BatchCommand::BatchCommand(CLI::App& program)
       "Clips at a time; at first as many as processors and memory allow");
   AddSwitch(parser_, "--reports", reports_,
             "Make a page of each clip too, as report does, which takes about half as long again");
+  CLI::Option* const on = AddChoice(
+      parser_, "--on", [this](const std::string& name) { on_ = name; }, {"here", "slurm"},
+      "Where clips are worked: on this machine, or as jobs of Slurm on machines that see the "
+      "clips, DIR and this program under the same names");
+  TellDefault(*on, on_);
+  CLI::Option* const flags = AddName(parser_, "--sbatch-args", sbatch_args_,
+                                     "Further flags for sbatch, such as \"--partition=long "
+                                     "--cpus-per-task=4 --mem=2G\"");
+  CLI::Option* const clips = AddNumber<int>(
+      parser_, "--clips-a-job", [this](int count) { clips_a_job_ = count; }, "N", 1, 1000000,
+      "Clips that a job does; at first as many as make some minute's work");
+  CLI::Option* const detach =
+      AddSwitch(parser_, "--detach", detaches_,
+                "Don't wait for the jobs; the same command tells later what became of them");
+  PutInGroup("Machines", {on, flags, clips, detach});
   const std::size_t own = parser_.get_options().size();
   AddControlFlags(parser_, controls_);
   AddShotsFlag(parser_, shots_);
@@ -155,14 +172,8 @@ void BatchCommand::Run() {
   batch::AddTasks(found.clips, name_, plan);
   batch::Appraise(plan, InterruptAsked);
 
-  const batch::Machine machine = batch::ThisMachine();
   BatchResults results(plan, progress);
-  if (!InterruptAsked()) {
-    batch::RunLocally(plan,
-                      batch::SettingsFor(run_.threads > 0 ? run_.threads : machine.processors,
-                                         machine.memory, jobs_),
-                      results);
-  }
+  if (!InterruptAsked() && !RunTasks(plan, results, progress)) return;
   results.Tell();
   if (!run_.quiet && !run_.json) std::fputs(results.Table().c_str(), stdout);
   results.WritePage();
@@ -172,6 +183,46 @@ void BatchCommand::Run() {
                       std::to_string(plan.tasks.size()) +
                       (plan.tasks.size() == 1 ? " clip failed" : " clips failed"));
   }
+}
+
+bool BatchCommand::RunTasks(const batch::Plan& plan, BatchResults& results,
+                            ProgressLine& progress) const {
+  if (on_ == "here") {
+    const batch::Machine machine = batch::ThisMachine();
+    const int processors = run_.threads > 0 ? run_.threads : machine.processors;
+    batch::RunLocally(plan, batch::SettingsFor(processors, machine.memory, jobs_), results);
+    return true;
+  }
+  batch::SlurmBatch cluster(
+      plan, {.flags = CLI::detail::split_up(sbatch_args_), .clips_a_job = clips_a_job_}, results);
+  const std::string job = cluster.Submit();
+  if (!job.empty()) progress.Note("submitted as job " + job);
+  if (detaches_ && !job.empty()) return false;
+  cluster.Wait();
+  return true;
+}
+
+BatchJobCommand::BatchJobCommand(CLI::App& program)
+    : Command(*program.add_subcommand("batch-job")->group("")) {
+  AddFile(parser_, "PLAN", plan_, "");
+}
+
+void BatchJobCommand::Run() {
+  const auto number_in = [](const char* name) {
+    const char* const text = std::getenv(name);
+    return text ? std::atoi(text) : -1;
+  };
+  const int group = number_in("SLURM_ARRAY_TASK_ID");
+  if (group < 0) throw UsageFailure("batch-job is run by a cluster");
+  class Watcher final : public batch::TaskWatcher {
+    void Show(double, const std::string&) override {}
+    bool Stops() override { return InterruptAsked(); }
+  } watcher;
+  // Of the machine the job may have some processors alone, also where nothing keeps it to them.
+  const int given = number_in("SLURM_CPUS_ON_NODE");
+  batch::RunGroup(plan_, static_cast<std::size_t>(group),
+                  given > 0 ? given : batch::ThisMachine().processors, watcher);
+  if (InterruptAsked()) throw Interrupted();
 }
 
 BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)

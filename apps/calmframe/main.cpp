@@ -170,6 +170,7 @@ int Run(int argc, char** argv) {
   InfoCommand info(program);
   TracksCommand tracks(program);
   ReportCommand report(program);
+  BatchJobCommand batch_job(program);
   BatchPicturesCommand batch_pictures(program);
   WriteCommand man_page(program, "write-man-page", [](const CLI::App& app) {
     return manual::ManPage(app, CALMFRAME_VERSION);
@@ -177,9 +178,9 @@ int Run(int argc, char** argv) {
   WriteCommand bash(program, "write-bash-completion", manual::BashCompletion);
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
-  Command* const commands[] = {&stabilize, &batch,          &demo, &analyze, &params,
-                               &shots,     &render,         &info, &tracks,  &report,
-                               &man_page,  &batch_pictures, &bash, &zsh,     &fish};
+  Command* const commands[] = {&stabilize, &batch, &demo,   &analyze, &params,   &shots,
+                               &render,    &info,  &tracks, &report,  &man_page, &batch_pictures,
+                               &batch_job, &bash,  &zsh,    &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;
