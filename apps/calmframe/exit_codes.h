@@ -8,6 +8,7 @@ enum ExitCode {
   kInput = 3,
   kOutput = 4,
   kSolveFailed = 5,
+  kClipsFailed = 6,
   kInterrupted = 130,
 };
 

@@ -16,4 +16,10 @@ class UsageFailure : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
+// Of a batch, clips that failed, each told by itself; one line that counts them.
+class ClipsFailed : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
 }  // namespace calmframe

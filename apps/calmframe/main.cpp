@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "apps/calmframe/analyze_command.h"
+#include "apps/calmframe/batch_command.h"
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/demo_command.h"
 #include "apps/calmframe/exit_codes.h"
@@ -146,6 +147,7 @@ constexpr char kFooter[] =
     "  3    input: a clip or project that can't be read\n"
     "  4    output: it exists already, or can't be written\n"
     "  5    the clip could not be analysed or solved\n"
+    "  6    some clips of a batch failed, as their lines say\n"
     "  130  interrupted\n"
     "\n"
     "Environment:\n"
@@ -160,6 +162,7 @@ int Run(int argc, char** argv) {
   program.footer(kFooter);
   program.require_subcommand(1);
   StabilizeCommand stabilize(program);
+  BatchCommand batch(program);
   DemoCommand demo(program);
   AnalyzeCommand analyze(program);
   ParamsCommand params(program);
@@ -170,15 +173,17 @@ int Run(int argc, char** argv) {
   InfoCommand info(program);
   TracksCommand tracks(program);
   ReportCommand report(program);
+  BatchJobCommand batch_job(program);
+  BatchPicturesCommand batch_pictures(program);
   WriteCommand man_page(program, "write-man-page", [](const CLI::App& app) {
     return manual::ManPage(app, CALMFRAME_VERSION);
   });
   WriteCommand bash(program, "write-bash-completion", manual::BashCompletion);
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
-  Command* const commands[] = {&stabilize, &demo,     &analyze, &params, &shots,
-                               &render,    &info,     &tracks,  &report, &gather,
-                               &join,      &man_page, &bash,    &zsh,    &fish};
+  Command* const commands[] = {&stabilize, &batch,          &demo,      &analyze, &params, &shots,
+                               &render,    &info,           &tracks,    &report,  &gather, &join,
+                               &man_page,  &batch_pictures, &batch_job, &bash,    &zsh,    &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;
@@ -210,6 +215,8 @@ int Run(int argc, char** argv) {
     return kDone;
   } catch (const UsageFailure& failure) {
     return Fail(kUsage, failure.what(), json);
+  } catch (const ClipsFailed& failure) {
+    return Fail(kClipsFailed, failure.what(), json);
   } catch (const Interrupted&) {
     return interrupted();
   } catch (const media::Failure& failure) {

@@ -142,6 +142,15 @@ void ProgressLine::Note(const std::string& line) {
   if (form_ == Form::line || form_ == Form::json) Tell("note", Prefix() + line);
 }
 
+void ProgressLine::Item(const std::string& line, const nlohmann::ordered_json& object,
+                        bool matters) {
+  if (form_ == Form::json || form_ == Form::json_end) {
+    std::fprintf(stderr, "%s\n", JsonLine(object).c_str());
+  } else if (matters || form_ == Form::line) {
+    Tell("", line);
+  }
+}
+
 void ProgressLine::End(const std::string& line, nlohmann::ordered_json object) {
   nlohmann::ordered_json sums = nlohmann::ordered_json::object();
   for (const auto& [stage, seconds] : seconds_) sums[stage] = sums.value(stage, 0.0) + seconds;

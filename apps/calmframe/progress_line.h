@@ -35,6 +35,9 @@ class ProgressLine final : public host::Watcher {
   bool Stops() override;
   // One line about how things went.
   void Note(const std::string& line);
+  // One of several things that came out, in its line or for programs its object; without progress
+  // the line only if `matters`.
+  void Item(const std::string& line, const nlohmann::ordered_json& object, bool matters);
   // What came out of it all: the line, or for programs the object, both with the seconds that each
   // stage took.
   void End(const std::string& line, nlohmann::ordered_json object);

@@ -122,6 +122,25 @@ InputPtr OpenInput(const std::string& path) {
   return container;
 }
 
+AVStream& VideoStreamOf(const AVFormatContext& container, const std::string& path) {
+  int best = av_find_best_stream(const_cast<AVFormatContext*>(&container), AVMEDIA_TYPE_VIDEO, -1,
+                                 -1, nullptr, 0);
+  for (unsigned i = 0; best < 0 && i < container.nb_streams; ++i) {
+    if (container.streams[i]->codecpar->codec_type == AVMEDIA_TYPE_VIDEO)
+      best = static_cast<int>(i);
+  }
+  if (best < 0 || (container.streams[best]->disposition & AV_DISPOSITION_ATTACHED_PIC)) {
+    Fail(path, "has no video stream");
+  }
+  AVStream& stream = *container.streams[best];
+  const AVCodecParameters& parameters = *stream.codecpar;
+  if (std::int64_t{parameters.width} * parameters.height > kMaximumPixels) {
+    Fail(path, "frames of " + std::to_string(parameters.width) + " x " +
+                   std::to_string(parameters.height) + " pixels are too large");
+  }
+  return stream;
+}
+
 Decoder::Decoder(const std::string& path, int threads)
     : path_(path), threads_(threads), packet_(NewPacket()) {
   Open();
@@ -134,20 +153,8 @@ void Decoder::Open() {
   draining_ = false;
   errors_in_a_row_ = 0;
 
-  int best = av_find_best_stream(container_.get(), AVMEDIA_TYPE_VIDEO, -1, -1, nullptr, 0);
-  for (unsigned i = 0; best < 0 && i < container_->nb_streams; ++i) {
-    if (container_->streams[i]->codecpar->codec_type == AVMEDIA_TYPE_VIDEO)
-      best = static_cast<int>(i);
-  }
-  if (best < 0 || (container_->streams[best]->disposition & AV_DISPOSITION_ATTACHED_PIC)) {
-    Fail(path_, "has no video stream");
-  }
-  stream_ = container_->streams[best];
+  stream_ = &VideoStreamOf(*container_, path_);
   const AVCodecParameters& parameters = *stream_->codecpar;
-  if (std::int64_t{parameters.width} * parameters.height > kMaximumPixels) {
-    Fail(path_, "frames of " + std::to_string(parameters.width) + " x " +
-                    std::to_string(parameters.height) + " pixels are too large");
-  }
   if (parameters.codec_id == AV_CODEC_ID_NONE) {
     Fail(path_, "its video is of a kind that is not known, or it is damaged at its start");
   }

@@ -15,6 +15,9 @@ constexpr std::int64_t kMaximumPixels = std::int64_t{1} << 27;
 // contents point to. Throws Failure (input).
 InputPtr OpenInput(const std::string& path);
 
+// The video of a clip that is steadied, of a size that can be. Throws Failure (input).
+AVStream& VideoStreamOf(const AVFormatContext& container, const std::string& path);
+
 // From now on FFmpeg prints nothing, and its decoders' complaints are counted. Any thread.
 void ListenToFfmpeg();
 

@@ -1,0 +1,240 @@
+#include "apps/calmframe/batch_command.h"
+
+#include <CLI/CLI.hpp>
+#include <algorithm>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <nlohmann/json.hpp>
+#include <system_error>
+#include <utility>
+
+#include "apps/calmframe/batch_results.h"
+#include "apps/calmframe/exit_codes.h"
+#include "apps/calmframe/failures.h"
+#include "apps/calmframe/film_work.h"
+#include "apps/calmframe/plugin_path.h"
+#include "apps/report/data_url.h"
+#include "host/batch/clip_names.h"
+#include "host/batch/clip_search.h"
+#include "host/batch/local_batch.h"
+#include "host/batch/machine.h"
+#include "host/batch/plan.h"
+#include "host/batch/slurm_batch.h"
+#include "host/effects/host.h"
+
+namespace calmframe {
+namespace {
+
+namespace fs = std::filesystem;
+
+static_assert(batch::kUsageCode == kUsage && batch::kInputCode == kInput &&
+              batch::kOutputCode == kOutput && batch::kWorkCode == kSolveFailed);
+
+// The folder, which is made.
+std::string MadeFolder(const std::string& path) {
+  std::error_code error;
+  fs::create_directories(path, error);
+  const fs::path place = error ? fs::path() : fs::canonical(path, error);
+  if (error || !fs::is_directory(place)) {
+    throw media::Failure(
+        media::Failure::Side::output,
+        batch::Shown(path) + ": " + (error ? error.message() : std::string("is not a folder")));
+  }
+  return place.string();
+}
+
+// What is wrong with them would be wrong for each clip.
+void CheckParams(const ControlFlags& controls) {
+  if (controls.params.empty()) return;
+  try {
+    const host::Host host(PluginPath());
+    ResolveControls(controls, host.declarations());
+  } catch (const host::PluginError& error) {
+    throw SolveFailure(error.what());
+  }
+}
+
+// The frame in a clip's middle, small.
+std::string PictureOf(const std::string& path) {
+  constexpr int kWidth = 160;  // pixels
+  std::size_t middle = 0;
+  const auto reader = media::ClipReader::OpenPromised(path, [&](const media::ClipInfo& clip) {
+    middle = clip.frame_count / 2;
+    return media::FrameRange{middle, middle + 1};
+  });
+  const media::ClipInfo& info = reader->info();
+  middle = std::min(middle, info.frame_count - 1);
+  std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(info.width) *
+                                static_cast<std::size_t>(info.height));
+  const std::ptrdiff_t row_bytes = info.width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8));
+  reader->Read(middle, pixels.data(), row_bytes);
+  return report::DataUrlOf(
+      {pixels.data(), row_bytes, info.width, info.height,
+       static_cast<double>(info.pixel_aspect.num) / static_cast<double>(info.pixel_aspect.den)},
+      kWidth);
+}
+
+}  // namespace
+
+BatchCommand::BatchCommand(CLI::App& program)
+    : Command(AddCommand(
+          program, "batch",
+          "Steady many clips\n\n"
+          "Each clip IN is steadied as stabilize would with the same flags, several at a time, "
+          "into the folder that --to names, with its project beside it. IN is a file, a folder "
+          "for the clips in it, a quoted pattern, or @LIST for the names in a file, one a line. "
+          "A clip that fails doesn't stop the others.\n\n"
+          "A second run goes on where the first one ended: what is done, of clips and with flags "
+          "that haven't changed, is left as it is. Several runs may work on one folder; none does "
+          "a clip that another one does. batch.html in the folder shows what became of all.",
+          "Examples:\n"
+          "  calmframe batch shaky.mp4 walk.mp4 --to steady\n"
+          "  calmframe batch clips --recursive --to calmer --smoothness 80\n"
+          "  calmframe batch 'v*.mp4' --to small --name \"{stem}-small.mp4\" --crf 28")) {
+  parser_.add_option("IN", inputs_, "Clips: files, folders, quoted patterns, @LIST")
+      ->type_name("FILE")
+      ->required();
+  AddFolder(parser_, "--to", folder_, "Where the steady clips go; made where it isn't there")
+      ->required()
+      ->default_str("");
+  AddSwitch(parser_, "--recursive", recursive_,
+            "Take the clips of folders within folders too; outputs keep these folders' names");
+  TellDefault(*AddName(parser_, "--name", name_,
+                       "What outputs are called: {stem} stands for the clip's name without its "
+                       "extension, {ext} for that with its dot"),
+              name_);
+  AddNumber<int>(
+      parser_, "--jobs", [this](int jobs) { jobs_ = jobs; }, "N", 1, 1024,
+      "Clips at a time; at first as many as processors and memory allow");
+  AddSwitch(parser_, "--reports", reports_,
+            "Make a page of each clip too, as report does, which takes about half as long again");
+  CLI::Option* const on = AddChoice(
+      parser_, "--on", [this](const std::string& name) { on_ = name; }, {"here", "slurm"},
+      "Where clips are worked: on this machine, or as jobs of Slurm on machines that see the "
+      "clips, DIR and this program under the same names");
+  TellDefault(*on, on_);
+  CLI::Option* const flags = AddName(parser_, "--sbatch-args", sbatch_args_,
+                                     "Further flags for sbatch, such as \"--partition=long "
+                                     "--cpus-per-task=4 --mem=2G\"");
+  CLI::Option* const clips = AddNumber<int>(
+      parser_, "--clips-a-job", [this](int count) { clips_a_job_ = count; }, "N", 1, 1000000,
+      "Clips that a job does; at first as many as make some minute's work");
+  CLI::Option* const detach =
+      AddSwitch(parser_, "--detach", detaches_,
+                "Don't wait for the jobs; the same command tells later what became of them");
+  PutInGroup("Machines", {on, flags, clips, detach});
+  const std::size_t own = parser_.get_options().size();
+  AddControlFlags(parser_, controls_);
+  AddShotsFlag(parser_, shots_);
+  AddOutputFlags(parser_, flags_);
+  for (std::size_t o = own; o < parser_.get_options().size(); ++o) {
+    const CLI::Option* const option = parser_.get_options()[o];
+    if (!option->check_lname("overwrite")) given_on_.push_back(option);
+  }
+  AddRunFlags(parser_, run_);
+}
+
+std::vector<std::string> BatchCommand::Settings() const {
+  std::vector<std::string> words;
+  for (const CLI::Option* option : given_on_) {
+    if (option->count() == 0) continue;
+    const std::string name = "--" + option->get_lnames()[0];
+    const bool is_switch = option->get_items_expected_max() == 0;
+    for (const std::string& value : option->reduced_results()) {
+      words.push_back(is_switch ? name : name + "=" + value);
+    }
+  }
+  // Those of one name stay in their order, where the last one counts.
+  std::stable_sort(words.begin(), words.end(), [](const std::string& a, const std::string& b) {
+    return a.substr(0, a.find('=')) < b.substr(0, b.find('='));
+  });
+  return words;
+}
+
+void BatchCommand::Run() {
+  ProgressLine progress(run_.progress_form());
+  if (const std::string trouble = batch::TemplateTrouble(name_); !trouble.empty()) {
+    throw UsageFailure("--name " + batch::Shown(trouble));
+  }
+  CheckParams(controls_);
+  const batch::FoundClips found = batch::FindClips(inputs_, recursive_);
+  batch::Plan plan{.program = fs::read_symlink("/proc/self/exe").string(),
+                   .folder = MadeFolder(folder_),
+                   .settings = Settings(),
+                   .overwrites = flags_.encode.overwrite,
+                   .reports = reports_};
+  if (found.outputs > 0) {
+    progress.Note("left out " + std::to_string(found.outputs) +
+                  (found.outputs == 1 ? " file that is an output of a batch"
+                                      : " files that are outputs of a batch"));
+  }
+  batch::AddTasks(found.clips, name_, plan);
+  batch::Appraise(plan, InterruptAsked);
+
+  BatchResults results(plan, progress);
+  if (!InterruptAsked() && !RunTasks(plan, results, progress)) return;
+  results.Tell();
+  if (!run_.quiet && !run_.json) std::fputs(results.Table().c_str(), stdout);
+  results.WritePage();
+  if (results.ended() < plan.tasks.size()) throw Interrupted();
+  if (results.failed() > 0) {
+    throw ClipsFailed(std::to_string(results.failed()) + " of " +
+                      std::to_string(plan.tasks.size()) +
+                      (plan.tasks.size() == 1 ? " clip failed" : " clips failed"));
+  }
+}
+
+bool BatchCommand::RunTasks(const batch::Plan& plan, BatchResults& results,
+                            ProgressLine& progress) const {
+  if (on_ == "here") {
+    const batch::Machine machine = batch::ThisMachine();
+    const int processors = run_.threads > 0 ? run_.threads : machine.processors;
+    batch::RunLocally(plan, batch::SettingsFor(processors, machine.memory, jobs_), results);
+    return true;
+  }
+  batch::SlurmBatch cluster(
+      plan, {.flags = CLI::detail::split_up(sbatch_args_), .clips_a_job = clips_a_job_}, results);
+  const std::string job = cluster.Submit();
+  if (!job.empty()) progress.Note("submitted as job " + job);
+  if (detaches_ && !job.empty()) return false;
+  cluster.Wait();
+  return true;
+}
+
+BatchJobCommand::BatchJobCommand(CLI::App& program)
+    : Command(*program.add_subcommand("batch-job")->group("")) {
+  AddFile(parser_, "PLAN", plan_, "");
+}
+
+void BatchJobCommand::Run() {
+  const auto number_in = [](const char* name) {
+    const char* const text = std::getenv(name);
+    return text ? std::atoi(text) : -1;
+  };
+  const int group = number_in("SLURM_ARRAY_TASK_ID");
+  if (group < 0) throw UsageFailure("batch-job is run by a cluster");
+  class Watcher final : public batch::TaskWatcher {
+    void Show(double, const std::string&) override {}
+    bool Stops() override { return InterruptAsked(); }
+  } watcher;
+  // Of the machine the job may have some processors alone, also where nothing keeps it to them.
+  const int given = number_in("SLURM_CPUS_ON_NODE");
+  batch::RunGroup(plan_, static_cast<std::size_t>(group),
+                  given > 0 ? given : batch::ThisMachine().processors, watcher);
+  if (InterruptAsked()) throw Interrupted();
+}
+
+BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)
+    : Command(*program.add_subcommand("batch-pictures")->group("")) {
+  AddFile(parser_, "BEFORE", before_, "");
+  AddFile(parser_, "AFTER", after_, "");
+}
+
+void BatchPicturesCommand::Run() {
+  const nlohmann::ordered_json object = {{"before", PictureOf(before_)},
+                                         {"after", PictureOf(after_)}};
+  std::printf("%s\n", object.dump().c_str());
+}
+
+}  // namespace calmframe

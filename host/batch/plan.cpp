@@ -1,0 +1,161 @@
+#include "host/batch/plan.h"
+
+#include <sys/stat.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <map>
+#include <nlohmann/json.hpp>
+#include <random>
+#include <set>
+#include <system_error>
+#include <utility>
+
+#include "host/media/clip.h"
+#include "host/media/glance.h"
+#include "platform/tessel/threads.h"
+
+namespace calmframe::batch {
+namespace {
+
+namespace fs = std::filesystem;
+
+// Measured peaks, rounded up: of the program with few frames, of frames under way, and of what the
+// analysis and the solve keep of each frame.
+constexpr double kProgramBytes = 160 << 20, kBytesAPixel = 60, kBytesAFrame = 100 << 10;
+
+void Refuse(Task& task, const std::string& why, int code) {
+  task.refused = why;
+  task.refused_code = code;
+}
+
+std::optional<std::pair<dev_t, ino_t>> FileAt(const std::string& path) {
+  struct stat status;
+  if (stat(path.c_str(), &status) != 0) return std::nullopt;
+  return std::pair(status.st_dev, status.st_ino);
+}
+
+}  // namespace
+
+std::string NewRun() {
+  std::random_device random;
+  char name[33];
+  std::snprintf(name, sizeof name, "%08x%08x%08x%08x", random(), random(), random(), random());
+  return name;
+}
+
+void AddTasks(const std::vector<FoundClip>& clips, const std::string& name_template, Plan& plan) {
+  constexpr std::size_t kLongestName = 255 - 5;  // bytes, on most file systems, with ".html" behind
+  std::map<std::string, std::size_t> users;      // of an output
+  std::set<std::pair<dev_t, ino_t>> sources;
+  for (const FoundClip& clip : clips) {
+    Task task;
+    task.clip = clip.name;
+    if (!clip.trouble.empty()) {
+      Refuse(task, clip.trouble, kInputCode);
+    } else {
+      task.source = fs::absolute(clip.name).lexically_normal().string();
+      task.output = OutputName(name_template, clip.below, clip.name);
+      ++users[task.output];
+      if (const auto file = FileAt(task.source)) sources.insert(*file);
+    }
+    plan.tasks.push_back(std::move(task));
+  }
+  for (Task& task : plan.tasks) {
+    if (!task.refused.empty()) continue;
+    const auto there = FileAt(plan.OutputOf(task));
+    if (users[task.output] > 1) {
+      Refuse(task,
+             std::to_string(users[task.output]) + " clips would be written to " +
+                 Shown(task.output) + "; another --name or --to keeps them apart",
+             kOutputCode);
+    } else if (there && sources.count(*there) > 0) {
+      Refuse(task, "would be written over " + Shown(task.output) + ", which is an input",
+             kOutputCode);
+    } else if (fs::path(task.output).filename().native().size() > kLongestName) {
+      Refuse(task,
+             "its output's name would be longer than " + std::to_string(kLongestName) + " bytes",
+             kOutputCode);
+    }
+  }
+}
+
+std::optional<Record> DoneRecord(const Plan& plan, const Task& task) {
+  std::optional<Record> record = ReadRecord(plan.FolderOf(task).record());
+  if (!record || record->state != Record::State::done || record->source != task.source ||
+      record->settings != plan.settings || !record->output_identity ||
+      IdentityOf(task.source) != record->source_identity ||
+      IdentityOf(plan.OutputOf(task)) != record->output_identity) {
+    return std::nullopt;
+  }
+  return record;
+}
+
+std::int64_t ExpectedMemory(double width, double height, double frames) {
+  return static_cast<std::int64_t>(kProgramBytes + kBytesAPixel * width * height +
+                                   kBytesAFrame * frames);
+}
+
+void Appraise(Plan& plan, const std::function<bool()>& stops) {
+  tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+      [&](std::size_t n) {
+        Task& task = plan.tasks[n];
+        if (!task.refused.empty() || stops() || DoneRecord(plan, task)) return;
+        try {
+          const media::Glance clip = media::GlanceAt(task.source);
+          constexpr double kSomeFrames = 1000;  // where nobody knows
+          const double frames = clip.frames > 0 ? clip.frames : kSomeFrames;
+          task.cost = frames * clip.width * clip.height;
+          task.memory = ExpectedMemory(clip.width, clip.height, frames);
+        } catch (const media::Failure& failure) {
+          // Its name as it was asked for stands before all that is told of it.
+          const std::string line = failure.what(), begin = task.source + ": ";
+          Refuse(task, Shown(line.starts_with(begin) ? line.substr(begin.size()) : line),
+                 kInputCode);
+        }
+      },
+      plan.tasks.size());
+}
+
+std::string TextOf(const Plan& plan) {
+  nlohmann::ordered_json json;
+  json["run"] = plan.run;
+  json["program"] = JsonOfBytes(plan.program);
+  json["folder"] = JsonOfBytes(plan.folder);
+  auto& settings = json["settings"] = nlohmann::ordered_json::array();
+  for (const std::string& word : plan.settings) settings.push_back(JsonOfBytes(word));
+  json["overwrites"] = plan.overwrites;
+  json["reports"] = plan.reports;
+  auto& tasks = json["tasks"] = nlohmann::ordered_json::array();
+  for (const Task& task : plan.tasks) {
+    tasks.push_back({{"clip", JsonOfBytes(task.clip)},
+                     {"source", JsonOfBytes(task.source)},
+                     {"output", JsonOfBytes(task.output)},
+                     {"cost", task.cost},
+                     {"memory", task.memory}});
+  }
+  return json.dump(1) + "\n";
+}
+
+Plan PlanOf(const std::string& text) {
+  const auto json = nlohmann::ordered_json::parse(text);
+  Plan plan;
+  plan.run = json.at("run").get<std::string>();
+  plan.program = BytesOf(json.at("program"));
+  plan.folder = BytesOf(json.at("folder"));
+  for (const auto& word : json.at("settings")) plan.settings.push_back(BytesOf(word));
+  plan.overwrites = json.at("overwrites").get<bool>();
+  plan.reports = json.at("reports").get<bool>();
+  for (const auto& entry : json.at("tasks")) {
+    Task task;
+    task.clip = BytesOf(entry.at("clip"));
+    task.source = BytesOf(entry.at("source"));
+    task.output = BytesOf(entry.at("output"));
+    task.cost = entry.at("cost").get<double>();
+    task.memory = entry.at("memory").get<std::int64_t>();
+    plan.tasks.push_back(std::move(task));
+  }
+  return plan;
+}
+
+}  // namespace calmframe::batch

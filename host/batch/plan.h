@@ -1,0 +1,71 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "host/batch/clip_search.h"
+#include "host/batch/record.h"
+#include "host/batch/task_folder.h"
+
+namespace calmframe::batch {
+
+// The program's exit codes that stand in records.
+constexpr int kUsageCode = 2, kInputCode = 3, kOutputCode = 4, kWorkCode = 5;
+
+// One clip -> one output, with its project beside it.
+struct Task {
+  std::string clip = {};    // as whoever asked for it calls it
+  std::string source = {};  // absolute
+  std::string output = {};  // to the plan's folder
+  // Of one that can't be begun: why, in words, and the exit code that it stands for.
+  std::string refused = {};
+  int refused_code = 0;
+  // What it is expected to take, by what its container says: the pixels of all frames, and bytes.
+  double cost = 0;
+  std::int64_t memory = 0;
+};
+
+// Unique among runs on all machines, letters and digits.
+std::string NewRun();
+
+// Clips that are steadied with the same settings to one folder.
+struct Plan {
+  std::string run = NewRun();  // a name of its own, for what it leaves
+  std::string program = {};    // absolute
+  std::string folder = {};     // absolute
+  // Flags of `stabilize`, "--name" or "--name=value", sorted.
+  std::vector<std::string> settings = {};
+  bool overwrites = false;  // files that are not of an earlier batch
+  bool reports = false;     // a page is made of each clip
+  std::vector<Task> tasks = {};
+
+  std::string OutputOf(const Task& task) const { return folder + "/" + task.output; }
+  std::string ProjectOf(const Task& task) const { return OutputOf(task) + ".calm"; }
+  std::string ReportOf(const Task& task) const { return OutputOf(task) + ".html"; }
+  TaskFolder FolderOf(const Task& task) const { return {folder, task.output}; }
+};
+
+// Gives `plan`, which has a folder, its tasks. Those whose output would be another's, or an input,
+// are refused.
+void AddTasks(const std::vector<FoundClip>& clips, const std::string& name_template, Plan& plan);
+
+// The record of what is done, with these settings, of what the clip is now, and stands unchanged;
+// none where there is something to do.
+std::optional<Record> DoneRecord(const Plan& plan, const Task& task);
+
+// Opens the clips of all tasks that are left to do, some at a time, for what they are expected to
+// take; those that can't be opened are refused. Once `stops` is true, no more of them.
+void Appraise(Plan& plan, const std::function<bool()>& stops);
+
+// Bytes at the peak, from frames of that size and number.
+std::int64_t ExpectedMemory(double width, double height, double frames);
+
+// As text, for other machines. Throws nlohmann::json::exception where it is none.
+std::string TextOf(const Plan& plan);
+Plan PlanOf(const std::string& text);
+
+}  // namespace calmframe::batch

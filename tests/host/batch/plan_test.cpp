@@ -1,0 +1,247 @@
+#include "host/batch/plan.h"
+
+#include <gmock/gmock.h>
+#include <sys/wait.h>
+
+#include <csignal>
+#include <filesystem>
+#include <nlohmann/json.hpp>
+
+#include "host/batch/clip_names.h"
+#include "host/batch/local_batch.h"
+#include "host/batch/machine.h"
+#include "tests/support/scratch_folder.h"
+
+namespace calmframe::batch {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+
+TEST(BatchNamesTest, OutputsAreCalledByTheirTemplate) {
+  const struct {
+    const char *name, *below, *clip, *output;
+  } cases[] = {
+      {"{stem}-steady{ext}", "", "a/walk.mp4", "walk-steady.mp4"},
+      {"{stem}-steady{ext}", "sub/deep", "a/sub/deep/walk.tar.mp4", "sub/deep/walk.tar-steady.mp4"},
+      {"{stem}.mkv", "", "x{ext}y{stem}.mp4", "x{ext}y{stem}.mkv"},
+      {"{stem}/{stem}{ext}", "", "no extension", "no extension/no extension"},
+      {"{stem}{ext}", "", "line\n\"quote'.mov", "line\n\"quote'.mov"}};
+  for (const auto& c : cases) EXPECT_EQ(OutputName(c.name, c.below, c.clip), c.output);
+  for (const std::string name : {"{stem}{ext}", "a b", "{stem}/{stem}.mkv"}) {
+    EXPECT_EQ(TemplateTrouble(name), "") << name;
+  }
+  for (const std::string name : {"", "{name}", "../{stem}", "/{stem}", "{stem}/", ".{stem}",
+                                 "a/.b/{stem}", "{stem}{", "a/../{stem}"}) {
+    EXPECT_NE(TemplateTrouble(name), "") << name;
+  }
+}
+
+TEST(BatchNamesTest, FoldersOfTasksAreSafeAndApart) {
+  const std::string long_name(300, 'x');
+  std::set<std::string> ids;
+  for (const std::string& name :
+       {std::string("a b.mp4"), std::string("a_b.mp4"), std::string("a/b.mp4"),
+        std::string("a\nb.mp4"), std::string("\xff.mp4"), std::string("\xc3\xa4.mp4"),
+        long_name + "1", long_name + "2", "1" + long_name}) {
+    const std::string id = TaskId(name);
+    EXPECT_LE(id.size(), 81u);
+    EXPECT_EQ(id.find_first_not_of("abcdefghijklmnopqrstuvwxyz0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZ"
+                                   "-._"),
+              std::string::npos)
+        << id;
+    EXPECT_TRUE(ids.insert(id).second) << id;
+  }
+  EXPECT_EQ(Shown("a\nb\t\x1b[2J\x7f\"'.mp4"), "a\\nb\\t\\x1b[2J\\x7f\"'.mp4");
+}
+
+class BatchPlanTest : public ::testing::Test, protected ScratchFolder {
+ protected:
+  void Make(const std::string& name) const {
+    std::filesystem::create_directories(std::filesystem::path(In(name)).parent_path());
+    MakeFile(name, "a clip");
+  }
+  std::vector<std::string> Found(const std::vector<std::string>& words, bool recursive) const {
+    std::vector<std::string> names;
+    for (const FoundClip& clip : FindClips(words, recursive).clips) {
+      const bool here = clip.name.starts_with(path().string() + "/");
+      names.push_back((here ? clip.name.substr(path().string().size() + 1) : clip.name) +
+                      (clip.below.empty() ? "" : " in " + clip.below) +
+                      (clip.trouble.empty() ? "" : ": " + clip.trouble));
+    }
+    return names;
+  }
+  Plan PlanOfClips(const std::vector<FoundClip>& clips, const std::string& name = "{stem}-s{ext}") {
+    std::filesystem::create_directories(In("out"));
+    Plan plan{.program = "/bin/false", .folder = In("out"), .settings = {"--crf=20"}};
+    AddTasks(clips, name, plan);
+    return plan;
+  }
+  void SaveRecord(const Plan& plan, const Record& record) const {
+    const TaskFolder folder = plan.FolderOf(plan.tasks[0]);
+    std::filesystem::create_directories(folder.path());
+    ASSERT_TRUE(WriteWhole(folder.record(), TextOf(record)));
+  }
+};
+
+TEST_F(BatchPlanTest, ClipsAreFound) {
+  for (const char* name : {"c/b.MP4", "c/a.mov", "c/notes.txt", "c/.hidden.mp4", "c/sub/d.mkv",
+                           "c/.calmframe/x/output.mp4", "odd.bin", "line\nbreak.mp4", "@at.mp4"}) {
+    Make(name);
+  }
+  std::filesystem::create_directory_symlink(In("c"), In("c/sub/circle"));
+  EXPECT_THAT(Found({In("c")}, false), ElementsAre("c/a.mov", "c/b.MP4"));
+  EXPECT_THAT(Found({In("c")}, true), ElementsAre("c/a.mov", "c/b.MP4", "c/sub/d.mkv in sub"));
+  // A file by itself is taken whatever it is called, and once; a pattern has no notion of kinds.
+  EXPECT_THAT(Found({In("odd.bin"), In("c/a.mov"), In("c/../c/a.mov"), In("c/[ab].*")}, false),
+              ElementsAre("odd.bin", "c/a.mov", "c/b.MP4"));
+  MakeFile("list", In("c/a.mov") + "\r\n\n" + In("c/sub") + "\n@list\nno.mp4\n");
+  EXPECT_THAT(Found({"@" + In("list")}, false),
+              ElementsAre("c/a.mov", "c/sub/d.mkv", "./@list: No such file or directory",
+                          "no.mp4: No such file or directory"));
+  MakeFile("list0", In("line\nbreak.mp4") + std::string(1, '\0') + In("@at.mp4"));
+  EXPECT_THAT(Found({"@" + In("list0")}, false), ElementsAre("line\nbreak.mp4", "@at.mp4"));
+  std::filesystem::create_directory(In("none"));
+  EXPECT_THAT(Found({In("none"), In("*.nothing"), "@" + In("no list")}, true),
+              ElementsAre("none: has no clips in it", "*.nothing: no file has such a name",
+                          HasSubstr("no list: No such file")));
+}
+
+TEST_F(BatchPlanTest, OutputsOfAnEarlierBatchAreNoClips) {
+  for (const char* name : {"c/a.mp4", "c/out/a-s.mp4", "c/out/sub/b-s.mp4", "c/out/mine.mp4"}) {
+    Make(name);
+  }
+  for (const std::string output : {"a-s.mp4", "sub/b-s.mp4", "mine.mp4"}) {
+    Record record{.output = output};
+    if (output != "mine.mp4") record.output_identity = IdentityOf(In("c/out/" + output));
+    const TaskFolder folder(In("c/out"), output);
+    std::filesystem::create_directories(folder.path());
+    ASSERT_TRUE(WriteWhole(folder.record(), TextOf(record)));
+  }
+  EXPECT_THAT(Found({In("c")}, true), ElementsAre("c/a.mp4", "c/out/mine.mp4 in out"));
+  const FoundClips named = FindClips({In("c/out/a-s.mp4"), In("c/out/sub")}, true);
+  EXPECT_EQ(named.outputs, 2u);
+  EXPECT_THAT(named.clips, ::testing::IsEmpty());
+}
+
+TEST_F(BatchPlanTest, OutputsThatWouldBeAnothersOrAnInputAreRefused) {
+  for (const char* name : {"a/x.mp4", "b/x.mp4", "a/y.mp4", "out/in.mp4"}) Make(name);
+  std::filesystem::create_hard_link(In("a/y.mp4"), In("out/y.mp4"));
+  Plan plan = PlanOfClips({{In("a/x.mp4")},
+                           {In("b/x.mp4")},
+                           {In("a/y.mp4")},
+                           {In("out/in.mp4")},
+                           {"gone", "", "is gone"}},
+                          "{stem}{ext}");
+  EXPECT_THAT(plan.tasks[0].refused, HasSubstr("2 clips would be written to x.mp4"));
+  EXPECT_EQ(plan.tasks[0].refused, plan.tasks[1].refused);
+  EXPECT_THAT(plan.tasks[2].refused, HasSubstr("written over y.mp4, which is an input"));
+  EXPECT_THAT(plan.tasks[3].refused, HasSubstr("written over in.mp4"));
+  EXPECT_EQ(plan.tasks[4].refused, "is gone");
+  EXPECT_EQ(plan.tasks[4].refused_code, kInputCode);
+  plan = PlanOfClips({{In("a/x.mp4")}, {In("b/x.mp4"), "b"}, {In("a/y.mp4")}});
+  for (const Task& task : plan.tasks) EXPECT_EQ(task.refused, "");
+  plan = PlanOfClips({{In("a/y.mp4")}}, std::string(246, 'n') + "{ext}");
+  EXPECT_EQ(plan.tasks[0].refused, "");
+  plan = PlanOfClips({{In("a/y.mp4")}}, std::string(247, 'n') + "{ext}");
+  EXPECT_THAT(plan.tasks[0].refused, HasSubstr("longer than 250 bytes"));
+}
+
+TEST_F(BatchPlanTest, WhatIsDoneIsDoneUntilAnythingChanges) {
+  Make("x.mp4");
+  Make("out/x-s.mp4");
+  const Plan plan = PlanOfClips({{In("x.mp4")}});
+  const Task& task = plan.tasks[0];
+  EXPECT_FALSE(DoneRecord(plan, task));
+  const Record whole{.state = Record::State::done,
+                     .source = task.source,
+                     .source_identity = *IdentityOf(task.source),
+                     .settings = plan.settings,
+                     .output = task.output,
+                     .output_identity = IdentityOf(plan.OutputOf(task)),
+                     .seconds = 1.5,
+                     .outcome = {{"most_zoom", 1.25}},
+                     .warnings = {"a line with \xff"}};
+  SaveRecord(plan, whole);
+  const std::optional<Record> read = DoneRecord(plan, task);
+  ASSERT_TRUE(read);
+  EXPECT_EQ(read->warnings, whole.warnings);
+  EXPECT_EQ(read->outcome, whole.outcome);
+  EXPECT_EQ(read->seconds, 1.5);
+  const std::function<void(Record&)> changes[] = {
+      [](Record& r) { r.state = Record::State::begun; },
+      [](Record& r) { r.state = Record::State::failed; },
+      [](Record& r) { ++r.source_identity.modified; },
+      [](Record& r) { ++r.source_identity.size; },
+      [](Record& r) { r.source += "x"; },
+      [](Record& r) { r.settings.push_back("--as-set"); },
+      [](Record& r) { ++r.output_identity->modified; },
+      [](Record& r) { r.output_identity.reset(); }};
+  for (const auto& change : changes) {
+    Record changed = whole;
+    change(changed);
+    SaveRecord(plan, changed);
+    EXPECT_FALSE(DoneRecord(plan, task)) << &change - changes;
+  }
+  // Cut anywhere it is none, and harmless.
+  const std::string text = TextOf(whole), path = plan.FolderOf(task).record();
+  for (std::size_t size = 0; size + 2 < text.size(); ++size) {
+    ASSERT_TRUE(WriteWhole(path, text.substr(0, size)));
+    ASSERT_FALSE(ReadRecord(path)) << size;
+  }
+  SaveRecord(plan, whole);
+  std::filesystem::remove(plan.OutputOf(task));
+  EXPECT_FALSE(DoneRecord(plan, task));
+}
+
+TEST_F(BatchPlanTest, ALockGoesWithTheLastProcessThatHasIt) {
+  {
+    const FileLock first(In("lock")), second(In("lock"));
+    EXPECT_TRUE(first.is_held());
+    EXPECT_FALSE(second.is_held());
+  }
+  int ready[2];
+  ASSERT_EQ(pipe(ready), 0);
+  const pid_t holder = fork();
+  if (holder == 0) {
+    const FileLock lock(In("lock"));
+    const bool told = write(ready[1], lock.is_held() ? "y" : "n", 1) == 1;
+    for (;;) pause();
+    _exit(told);
+  }
+  char held = 0;
+  ASSERT_EQ(read(ready[0], &held, 1), 1);
+  EXPECT_EQ(held, 'y');
+  EXPECT_FALSE(FileLock(In("lock")).is_held());
+  kill(holder, SIGKILL);
+  waitpid(holder, nullptr, 0);
+  EXPECT_TRUE(FileLock(In("lock")).is_held());
+  EXPECT_THROW(FileLock(In("no folder/lock")), std::system_error);
+}
+
+TEST_F(BatchPlanTest, APlanIsReadAsItWasWritten) {
+  Make("x.mp4");
+  Plan plan = PlanOfClips({{In("x.mp4")}, {In("\xff\n.mp4")}});
+  plan.reports = true;
+  plan.tasks[1].memory = std::int64_t{1} << 40;
+  const Plan read = PlanOf(TextOf(plan));
+  ASSERT_EQ(read.tasks.size(), 2u);
+  EXPECT_EQ(read.tasks[1].source, plan.tasks[1].source);
+  EXPECT_EQ(read.tasks[1].output, plan.tasks[1].output);
+  EXPECT_EQ(read.tasks[1].memory, plan.tasks[1].memory);
+  EXPECT_EQ(TextOf(read), TextOf(plan));
+  EXPECT_THROW(PlanOf("{}"), nlohmann::json::exception);
+}
+
+TEST(BatchMachineTest, JobsGoByProcessorsAndMemoryUnlessTheyAreSet) {
+  const Machine machine = ThisMachine();
+  EXPECT_GE(machine.processors, 1);
+  EXPECT_GT(machine.memory, std::int64_t{16} << 20);
+  EXPECT_EQ(SettingsFor(8, 1000, 0).jobs, 8);
+  EXPECT_EQ(SettingsFor(8, 1000, 0).memory, 800);
+  EXPECT_EQ(SettingsFor(8, 1000, 3).jobs, 3);
+  EXPECT_EQ(SettingsFor(8, 1000, 3).memory, 0);
+}
+
+}  // namespace
+}  // namespace calmframe::batch
