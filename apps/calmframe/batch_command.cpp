@@ -173,7 +173,7 @@ void BatchCommand::Run() {
   batch::Appraise(plan, InterruptAsked);
 
   BatchResults results(plan, progress);
-  if (!InterruptAsked() && !RunTasks(plan, results, progress)) return;
+  if (!InterruptAsked() && !RunTasks(plan, results)) return;
   results.Tell();
   if (!run_.quiet && !run_.json) std::fputs(results.Table().c_str(), stdout);
   results.WritePage();
@@ -185,8 +185,7 @@ void BatchCommand::Run() {
   }
 }
 
-bool BatchCommand::RunTasks(const batch::Plan& plan, BatchResults& results,
-                            ProgressLine& progress) const {
+bool BatchCommand::RunTasks(const batch::Plan& plan, BatchResults& results) const {
   if (on_ == "here") {
     const batch::Machine machine = batch::ThisMachine();
     const int processors = run_.threads > 0 ? run_.threads : machine.processors;
@@ -195,9 +194,7 @@ bool BatchCommand::RunTasks(const batch::Plan& plan, BatchResults& results,
   }
   batch::SlurmBatch cluster(
       plan, {.flags = CLI::detail::split_up(sbatch_args_), .clips_a_job = clips_a_job_}, results);
-  const std::string job = cluster.Submit();
-  if (!job.empty()) progress.Note("submitted as job " + job);
-  if (detaches_ && !job.empty()) return false;
+  if (cluster.Submit() && detaches_) return false;
   cluster.Wait();
   return true;
 }

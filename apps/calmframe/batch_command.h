@@ -21,7 +21,7 @@ class BatchCommand final : public Command {
   // What is given on to each clip's run, as its words, sorted.
   std::vector<std::string> Settings() const;
   // False where nobody waits for what was begun.
-  bool RunTasks(const batch::Plan& plan, BatchResults& results, ProgressLine& progress) const;
+  bool RunTasks(const batch::Plan& plan, BatchResults& results) const;
 
   std::vector<std::string> inputs_;
   std::string folder_, name_ = "{stem}-steady{ext}";

@@ -19,6 +19,7 @@ class BatchResults final : public batch::BatchWatcher {
 
   void Show(const std::vector<double>& shares, std::size_t working) override;
   void Ended(std::size_t task, const batch::TaskResult& result) override;
+  void Note(const std::string& line) override { progress_.Note(line); }
   bool Stops() override { return progress_.Stops(); }
 
   std::size_t failed() const { return Count(batch::TaskResult::State::failed); }

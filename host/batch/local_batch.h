@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <string>
 #include <vector>
 
 #include "host/batch/plan.h"
@@ -27,6 +28,8 @@ class BatchWatcher {
   // Some ten times a second. shares: 0 to 1 of each task; working: how many are run just now.
   virtual void Show(const std::vector<double>& shares, std::size_t working) = 0;
   virtual void Ended(std::size_t task, const TaskResult& result) = 0;
+  // A line about how it goes.
+  virtual void Note(const std::string& /*line*/) {}
   virtual bool Stops() = 0;
 };
 

@@ -22,7 +22,7 @@ namespace fs = std::filesystem;
 
 // Measured peaks, rounded up: of the program with few frames, of frames under way, and of what the
 // analysis and the solve keep of each frame.
-constexpr double kProgramBytes = 160 << 20, kBytesAPixel = 60, kBytesAFrame = 100 << 10;
+constexpr double kProgramBytes = 160 << 20, kBytesAPixel = 200, kBytesAFrame = 100 << 10;
 
 void Refuse(Task& task, const std::string& why, int code) {
   task.refused = why;

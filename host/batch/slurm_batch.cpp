@@ -68,12 +68,13 @@ std::string Quoted(const std::string& word) {
 
 }  // namespace
 
-std::vector<std::vector<std::size_t>> GroupsOf(const Plan& plan, int clips_a_job) {
+std::vector<std::vector<std::size_t>> GroupsOf(const Plan& plan, int clips_a_job,
+                                               const std::vector<bool>& left_out) {
   const auto weight = [&](std::size_t n) { return clips_a_job > 0 ? 1 : plan.tasks[n].cost; };
   std::vector<std::size_t> left;
   double whole = 0;
   for (std::size_t n = 0; n < plan.tasks.size(); ++n) {
-    if (!plan.tasks[n].refused.empty() || DoneRecord(plan, plan.tasks[n])) continue;
+    if (left_out[n] || !plan.tasks[n].refused.empty() || DoneRecord(plan, plan.tasks[n])) continue;
     left.push_back(n);
     whole += weight(n);
   }
@@ -104,10 +105,59 @@ SlurmBatch::SlurmBatch(const Plan& plan, const SlurmSettings& settings, BatchWat
       shares_(plan.tasks.size()),
       killed_(plan.tasks.size()) {}
 
-std::string SlurmBatch::Submit() {
-  for (std::size_t n = 0; n < plan_.tasks.size(); ++n) TakeResult(n);
-  const auto groups = GroupsOf(plan_, settings_.clips_a_job);
-  return groups.empty() ? "" : Submit(groups);
+bool SlurmBatch::Submit() {
+  for (std::size_t n = 0; n < ended_.size(); ++n) TakeResult(n);
+  Adopt();
+  std::vector<bool> adopted(submitted_.begin(), submitted_.end());
+  const auto groups = GroupsOf(plan_, settings_.clips_a_job, adopted);
+  if (!groups.empty()) watcher_.Note("submitted as job " + Submit(groups));
+  return !arrays_.empty();
+}
+
+// Tasks of ours that jobs of a run before have still to do, as whoever let go of them left them;
+// runs of which no job is left are cleared away.
+void SlurmBatch::Adopt() {
+  std::map<std::string, std::size_t> ours;
+  for (std::size_t n = 0; n < plan_.tasks.size(); ++n) {
+    if (!ended_[n]) ours[plan_.tasks[n].output] = n;
+  }
+  std::error_code error;
+  bool has_looked = false;
+  for (const auto& entry :
+       fs::directory_iterator(plan_.folder + "/" + kRecordsFolder + "/runs", error)) {
+    const auto json = ReadObject(entry.path() / "plan.json");
+    const auto job = ReadObject(entry.path() / "job.json");
+    if (!json || !job) continue;
+    if (!has_looked && !Look()) return;
+    has_looked = true;
+    try {
+      Array array{job->at("job").get<std::string>(), {}};
+      const Plan plan = PlanOf(json->at("plan").get<std::string>());
+      const auto groups = json->at("groups").get<std::vector<std::vector<std::size_t>>>();
+      array.groups.resize(groups.size());
+      std::size_t alive = 0, count = 0;
+      for (std::size_t g = 0; g < groups.size(); ++g) {
+        if (!there_[{array.job, g}].is_there) continue;
+        ++alive;
+        for (const std::size_t theirs : groups[g]) {
+          const auto found = ours.find(plan.tasks.at(theirs).output);
+          if (found == ours.end() || plan.settings != plan_.settings ||
+              plan.tasks[theirs].source != plan_.tasks[found->second].source) {
+            continue;
+          }
+          array.groups[g].push_back(found->second);
+          ++submitted_[found->second];
+          ++count;
+          ours.erase(found);
+        }
+      }
+      if (alive == 0) fs::remove_all(entry.path(), error);
+      if (count == 0) continue;
+      watcher_.Note("job " + array.job + " of an earlier run is still at work");
+      arrays_.push_back(std::move(array));
+    } catch (const std::exception&) {  // of another version
+    }
+  }
 }
 
 std::string SlurmBatch::Submit(std::vector<std::vector<std::size_t>> groups) {
@@ -136,6 +186,8 @@ std::string SlurmBatch::Submit(std::vector<std::vector<std::size_t>> groups) {
       !std::all_of(job.begin(), job.end(), [](unsigned char c) { return std::isdigit(c); })) {
     throw ClusterFailure("Slurm takes no jobs: " + Shown(last));
   }
+  // Without it nobody can take the jobs over, and they go on.
+  WriteWhole(folder + "/job.json", nlohmann::ordered_json{{"job", job}}.dump());
   for (const auto& group : groups) {
     for (const std::size_t n : group) ++submitted_[n];
   }
@@ -156,11 +208,14 @@ void SlurmBatch::TakeResult(std::size_t n) {
     result.state = submitted_[n] > 0 ? TaskResult::State::done : TaskResult::State::unchanged;
     result.record = *std::move(done);
   } else if (submitted_[n] > 0) {
-    const std::optional<Record> record = ReadRecord(plan_.FolderOf(task).record());
+    std::optional<Record> record = ReadRecord(plan_.FolderOf(task).record());
     if (!record || record->state != Record::State::failed || record->run != plan_.run) return;
     // What killed its program, such as too little memory, may not come again elsewhere.
     if (record->exit_code > 128 && submitted_[n] <= settings_.retries) {
       killed_[n] = record->error;
+      // So that it isn't taken for the next try's.
+      record->state = Record::State::begun;
+      WriteWhole(plan_.FolderOf(task).record(), TextOf(*record));
       return;
     }
     result.state = TaskResult::State::failed;
@@ -173,20 +228,15 @@ void SlurmBatch::TakeResult(std::size_t n) {
   watcher_.Ended(n, result);
 }
 
-void SlurmBatch::Collect() {
-  for (std::size_t n = 0; n < ended_.size(); ++n) TakeResult(n);
-}
-
-// What the cluster says of the jobs; those that it has no more and that left no result are lost.
-void SlurmBatch::Follow() {
+bool SlurmBatch::Look() {
   const Answer answer = Ask({"squeue", "--noheader", "--array", "--format=%F %K %T %r"});
   if (answer.code != 0) {
-    if (++unanswered_ < kMostUnanswered) return;
+    if (++unanswered_ < kMostUnanswered) return false;
     throw ClusterFailure("Slurm doesn't answer: " +
                          (answer.lines.empty() ? "" : Shown(answer.lines.back())));
   }
   unanswered_ = 0;
-  std::map<std::pair<std::string, std::size_t>, Element> there;
+  there_.clear();
   for (const std::string& line : answer.lines) {
     std::istringstream words(line);
     std::string job, state, reason;
@@ -195,18 +245,26 @@ void SlurmBatch::Follow() {
     std::getline(words, reason);
     // One that is held after it could not be started waits for an administrator.
     const bool is_held = state == "PENDING" && reason.find("eld") != std::string::npos;
-    there[{job, index}] = {!is_held, state == "RUNNING"};
+    there_[{job, index}] = {!is_held, state == "RUNNING"};
   }
-  // Results that came while the cluster was asked; what is missing now was not left.
-  Collect();
+  return true;
+}
+
+// Jobs that the cluster has no more and that left no result are lost.
+void SlurmBatch::Follow() {
+  if (!Look()) return;
   working_ = 0;
   std::vector<std::vector<std::size_t>> again;
   for (Array& array : arrays_) {
     for (std::size_t g = 0; g < array.groups.size(); ++g) {
       auto& group = array.groups[g];
+      const Element element = there_[{array.job, g}];
+      // Of those that wait nothing is read: there may be thousands, on a disk that others use too.
+      if (group.empty() || (element.is_there && !element.is_running)) continue;
+      // What was there when the cluster was asked has left its result by now.
+      for (const std::size_t n : group) TakeResult(n);
       std::erase_if(group, [this](std::size_t n) { return ended_[n]; });
       if (group.empty()) continue;
-      const Element element = there[{array.job, g}];
       if (element.is_running) {
         ++working_;
         for (const std::size_t n : group) {
@@ -233,7 +291,13 @@ void SlurmBatch::Follow() {
       if (!lost.empty()) again.push_back(std::move(lost));
     }
   }
-  if (!again.empty()) Submit(std::move(again));
+  if (again.empty()) return;
+  std::size_t clips = 0;
+  for (const auto& group : again) clips += group.size();
+  watcher_.Note(std::to_string(clips) +
+                (clips == 1 ? " clip was lost with its job or killed"
+                            : " clips were lost with their jobs or killed") +
+                ": submitted again as job " + Submit(std::move(again)));
 }
 
 void SlurmBatch::Cancel() {

@@ -1,8 +1,10 @@
 #pragma once
 
 #include <cstddef>
+#include <map>
 #include <stdexcept>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "host/batch/local_batch.h"
@@ -24,8 +26,10 @@ struct SlurmSettings {
 
 // The tasks that are left to do, as groups for a job each: long ones by themselves, short ones
 // together, or so many of each, the longest first, and no more groups than an array of jobs may
-// have.
-std::vector<std::vector<std::size_t>> GroupsOf(const Plan& plan, int clips_a_job);
+// have;
+// those that are `left_out`, a task each, are in none.
+std::vector<std::vector<std::size_t>> GroupsOf(const Plan& plan, int clips_a_job,
+                                               const std::vector<bool>& left_out);
 
 // Runs a plan's tasks as arrays of jobs of Slurm, by sbatch, squeue and scancel. All machines see
 // the plan's folder, the clips and the program under the same names; how tasks go and end is read
@@ -35,9 +39,9 @@ class SlurmBatch {
   // The watcher outlives it. Throws ClusterFailure.
   SlurmBatch(const Plan& plan, const SlurmSettings& settings, BatchWatcher& watcher);
 
-  // Hands the tasks that are left to do to the cluster, and tells the number of the array; empty
-  // where there are none. Throws ClusterFailure.
-  std::string Submit();
+  // Hands the tasks that are left to do to the cluster, but for those that jobs of an earlier run
+  // have still before them. False where there is nothing to wait for. Throws ClusterFailure.
+  bool Submit();
 
   // Returns when all have ended, each told to the watcher; those that a job left without a result,
   // or whose program was killed, are submitted again, so many times. Once the watcher stops it, the
@@ -54,16 +58,22 @@ class SlurmBatch {
     bool is_there = false, is_running = false;
   };
 
+  // What the cluster has of each array's elements. False where it doesn't answer.
+  bool Look();
+  void Adopt();
+  // The number of the array.
   std::string Submit(std::vector<std::vector<std::size_t>> groups);
-  void Collect();
   void TakeResult(std::size_t task);
   void Follow();
   void Cancel();
+
+  using Elements = std::map<std::pair<std::string, std::size_t>, Element>;
 
   const Plan& plan_;
   const SlurmSettings settings_;
   BatchWatcher& watcher_;
   std::vector<Array> arrays_;
+  Elements there_;              // as it was looked last
   std::vector<bool> ended_;     // a task each, as all of these
   std::vector<int> submitted_;  // how often
   std::vector<double> shares_;

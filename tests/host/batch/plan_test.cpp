@@ -10,6 +10,7 @@
 #include "host/batch/clip_names.h"
 #include "host/batch/local_batch.h"
 #include "host/batch/machine.h"
+#include "host/batch/slurm_batch.h"
 #include "tests/support/scratch_folder.h"
 
 namespace calmframe::batch {
@@ -231,6 +232,30 @@ TEST_F(BatchPlanTest, APlanIsReadAsItWasWritten) {
   EXPECT_EQ(read.tasks[1].memory, plan.tasks[1].memory);
   EXPECT_EQ(TextOf(read), TextOf(plan));
   EXPECT_THROW(PlanOf("{}"), nlohmann::json::exception);
+}
+
+TEST(BatchGroupsTest, ShortClipsShareAJobAndNoArrayIsTooLong) {
+  Plan plan{.folder = "/no folder"};
+  for (const double cost : {3e8, 5e9, 2e8, 0.0, 6e8, 1e8}) {
+    Task task;
+    task.cost = cost;
+    if (cost == 0) task.refused = "no clip";
+    plan.tasks.push_back(task);
+  }
+  using Groups = std::vector<std::vector<std::size_t>>;
+  std::vector<bool> none(6), first(6);
+  first[0] = true;
+  EXPECT_EQ(GroupsOf(plan, 0, none), (Groups{{1}, {4, 0, 2}, {5}}));
+  EXPECT_EQ(GroupsOf(plan, 2, none), (Groups{{1, 4}, {0, 2}, {5}}));
+  EXPECT_EQ(GroupsOf(plan, 1, first), (Groups{{1}, {4}, {2}, {5}}));
+  plan.tasks.assign(25000, plan.tasks[1]);
+  for (const int clips_a_job : {0, 1}) {
+    std::size_t tasks = 0;
+    const Groups groups = GroupsOf(plan, clips_a_job, std::vector<bool>(25000));
+    for (const auto& group : groups) tasks += group.size();
+    EXPECT_LE(groups.size(), 1000u);
+    EXPECT_EQ(tasks, 25000u);
+  }
 }
 
 TEST(BatchMachineTest, JobsGoByProcessorsAndMemoryUnlessTheyAreSet) {
