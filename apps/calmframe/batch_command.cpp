@@ -14,6 +14,7 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/film_work.h"
 #include "apps/calmframe/plugin_path.h"
+#include "apps/calmframe/project_work.h"
 #include "apps/report/data_url.h"
 #include "host/batch/clip_names.h"
 #include "host/batch/clip_search.h"
@@ -21,7 +22,9 @@
 #include "host/batch/machine.h"
 #include "host/batch/plan.h"
 #include "host/batch/slurm_batch.h"
+#include "host/batch/split_film.h"
 #include "host/effects/host.h"
+#include "platform/tessel/threads.h"
 
 namespace calmframe {
 namespace {
@@ -91,7 +94,9 @@ BatchCommand::BatchCommand(CLI::App& program)
           "Examples:\n"
           "  calmframe batch shaky.mp4 walk.mp4 --to steady\n"
           "  calmframe batch clips --recursive --to calmer --smoothness 80\n"
-          "  calmframe batch 'v*.mp4' --to small --name \"{stem}-small.mp4\" --crf 28")) {
+          "  calmframe batch 'v*.mp4' --to small --name \"{stem}-small.mp4\" --crf 28\n"
+          "  calmframe batch film.mp4 --to steady --split")),
+      program_(program) {
   parser_.add_option("IN", inputs_, "Clips: files, folders, quoted patterns, @LIST")
       ->type_name("FILE")
       ->required();
@@ -123,7 +128,16 @@ BatchCommand::BatchCommand(CLI::App& program)
   CLI::Option* const detach =
       AddSwitch(parser_, "--detach", detaches_,
                 "Don't wait for the jobs; the same command tells later what became of them");
-  PutInGroup("Machines", {on, flags, clips, detach});
+  CLI::Option* const split = AddSwitch(
+      parser_, "--split", splits_,
+      "Work each clip in pieces that machines or processors share, for films of hours: its shots "
+      "are analysed apart, its frames drawn in stretches and joined without being encoded again");
+  CLI::Option* const piece = AddNumber<int>(
+      parser_, "--frames-a-piece",
+      [this](int frames) { frames_a_piece_ = static_cast<std::size_t>(frames); }, "N", 1, 1000000,
+      "Frames of such a stretch; at first 250, or more of a long film");
+  Exclude(*split, *detach);
+  PutInGroup("Machines", {on, flags, clips, detach, split, piece});
   const std::size_t own = parser_.get_options().size();
   AddControlFlags(parser_, controls_);
   AddShotsFlag(parser_, shots_);
@@ -185,18 +199,92 @@ void BatchCommand::Run() {
   }
 }
 
-bool BatchCommand::RunTasks(const batch::Plan& plan, BatchResults& results) const {
+std::vector<std::string> BatchCommand::SettingsFor(const std::string& command) const {
+  const CLI::App& taker = *program_.get_subcommand(command);
+  std::vector<std::string> words = Settings();
+  std::erase_if(words, [&](const std::string& word) {
+    return !taker.get_option_no_throw(word.substr(0, word.find('=')));
+  });
+  return words;
+}
+
+void BatchCommand::RunAll(const batch::Plan& plan, batch::BatchWatcher& watcher) const {
   if (on_ == "here") {
     const batch::Machine machine = batch::ThisMachine();
     const int processors = run_.threads > 0 ? run_.threads : machine.processors;
-    batch::RunLocally(plan, batch::SettingsFor(processors, machine.memory, jobs_), results);
-    return true;
+    batch::RunLocally(plan, batch::SettingsFor(processors, machine.memory, jobs_), watcher);
+    return;
   }
-  batch::SlurmBatch cluster(
-      plan, {.flags = CLI::detail::split_up(sbatch_args_), .clips_a_job = clips_a_job_}, results);
-  if (cluster.Submit() && detaches_) return false;
+  batch::SlurmBatch cluster(plan, Cluster(), watcher);
+  cluster.Submit();
   cluster.Wait();
+}
+
+bool BatchCommand::RunTasks(const batch::Plan& plan, BatchResults& results) const {
+  if (splits_) {
+    RunInPieces(plan, results);
+  } else if (!detaches_ || on_ == "here") {
+    RunAll(plan, results);
+  } else {
+    batch::SlurmBatch cluster(plan, Cluster(), results);
+    if (cluster.Submit()) return false;
+    cluster.Wait();
+  }
   return true;
+}
+
+void BatchCommand::RunInPieces(const batch::Plan& plan, BatchResults& results) const {
+  const auto without = [](std::vector<std::string> words, const std::string& flag) {
+    std::erase_if(words, [&](const std::string& word) { return word.starts_with(flag + "="); });
+    return words;
+  };
+  // Each shot is one that is told.
+  const batch::SplitSettings settings{.looking = SettingsFor("batch-shots"),
+                                      .analysis = without(SettingsFor("analyze"), "--shots"),
+                                      .drawing = SettingsFor("render"),
+                                      .frames_a_piece = frames_a_piece_};
+  std::vector<double> shares(plan.tasks.size());
+  for (std::size_t film = 0; film < plan.tasks.size() && !results.Stops(); ++film) {
+    batch::SteadyInPieces(
+        plan, film, settings,
+        [this](const batch::Plan& stage, batch::BatchWatcher& watcher) { RunAll(stage, watcher); },
+        shares, results);
+  }
+}
+
+batch::SlurmSettings BatchCommand::Cluster() const {
+  return {.flags = CLI::detail::split_up(sbatch_args_), .clips_a_job = clips_a_job_};
+}
+
+BatchShotsCommand::BatchShotsCommand(CLI::App& program)
+    : Command(*program.add_subcommand("batch-shots")->group("")) {
+  AddFile(parser_, "IN", input_, "");
+  AddFile(parser_, "OUT", output_, "");
+  AddShotsFlag(parser_, shots_);
+  AddRunFlags(parser_, run_);
+}
+
+void BatchShotsCommand::Run() {
+  const tessel::threads::ProcessorLimit limit(run_.threads);
+  ProgressLine progress(run_.progress_form());
+  RunOnPromises([&](host::Opening opening) { Find(opening, progress); });
+}
+
+void BatchShotsCommand::Find(host::Opening opening, ProgressLine& progress) const {
+  const host::ClipMedium medium =
+      host::MediumOf(opening == host::Opening::promised ? media::ClipReader::OpenPromised(input_)
+                                                        : media::ClipReader::Open(input_));
+  if (!medium.info.warning.empty()) progress.Warn(medium.info.warning);
+  const std::vector<std::size_t> begins = host::ShotStarts(medium, shots_, progress);
+  auto shots = nlohmann::ordered_json::array();
+  for (std::size_t s = 0; s < begins.size(); ++s) {
+    const std::size_t end = s + 1 < begins.size() ? begins[s + 1] : medium.info.frame_count;
+    shots.push_back({{"first_frame", begins[s]}, {"end_frame", end}});
+  }
+  const nlohmann::ordered_json object = {{"shots", shots}};
+  if (!batch::WriteWhole(output_, object.dump() + "\n")) {
+    throw media::Failure(media::Failure::Side::output, output_ + ": can't be written");
+  }
 }
 
 BatchJobCommand::BatchJobCommand(CLI::App& program)

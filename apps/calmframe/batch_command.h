@@ -6,6 +6,7 @@
 #include "apps/calmframe/batch_results.h"
 #include "apps/calmframe/command.h"
 #include "apps/calmframe/stabilize_command.h"
+#include "host/batch/slurm_batch.h"
 
 namespace calmframe {
 
@@ -22,13 +23,23 @@ class BatchCommand final : public Command {
   std::vector<std::string> Settings() const;
   // False where nobody waits for what was begun.
   bool RunTasks(const batch::Plan& plan, BatchResults& results) const;
+  // The same, with each clip in pieces.
+  void RunInPieces(const batch::Plan& plan, BatchResults& results) const;
+  // Returns when all have ended or the watcher stops them.
+  void RunAll(const batch::Plan& plan, batch::BatchWatcher& watcher) const;
+  batch::SlurmSettings Cluster() const;
+  // Those of Settings() that a command takes.
+  std::vector<std::string> SettingsFor(const std::string& command) const;
 
   std::vector<std::string> inputs_;
   std::string folder_, name_ = "{stem}-steady{ext}";
   bool recursive_ = false, reports_ = false, detaches_ = false;
   std::string on_ = "here", sbatch_args_;
   int clips_a_job_ = 0;
+  bool splits_ = false;
+  std::size_t frames_a_piece_ = 0;
   int jobs_ = 0;  // 0: by the machine
+  const CLI::App& program_;
   // These are for the runs of the clips.
   host::ShotRequest shots_;
   ControlFlags controls_;
@@ -46,6 +57,21 @@ class BatchJobCommand final : public Command {
 
  private:
   std::string plan_;
+};
+
+// Nor is this: writes where a film's shots lie as an object, for whoever works them apart.
+class BatchShotsCommand final : public Command {
+ public:
+  explicit BatchShotsCommand(CLI::App& program);
+  bool json() const override { return run_.json; }
+  void Run() override;
+
+ private:
+  void Find(host::Opening opening, ProgressLine& progress) const;
+
+  std::string input_, output_;
+  host::ShotRequest shots_;
+  RunFlags run_;
 };
 
 // Nor is this: prints how a clip looks before and after as an object,

@@ -112,20 +112,25 @@ bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
 }
 
 void FilmOutcome::Add(host::SteadyClip& shot) {
-  Told told{film_.number() + 1, shot.range(), {}, "", nlohmann::ordered_json::object()};
   // That leaves what it leaves.
-  if (shot.ValueOf(HX_FRAMING.disk_id) != host::kStabilizeOnly) {
-    told.outcome.outcome = shot.Measure();
-    told.object = told.outcome.outcome.Json();
-    told.line = told.outcome.outcome.Text();
-    if (const host::Choice* choice = shot.choice()) {
-      told.object["choice"] = choice->Json();
-      told.line += "; " + choice->Text();
-    }
+  if (shot.ValueOf(HX_FRAMING.disk_id) == host::kStabilizeOnly) return;
+  Add(film_.number(), shot.range(), shot.Measure(), shot.choice());
+}
+
+void FilmOutcome::Add(std::size_t number, const media::FrameRange& range,
+                      const host::Outcome& outcome, const host::Choice* choice) {
+  Told told{.number = number + 1,
+            .range = range,
+            .outcome = {.outcome = outcome,
+                        .begins = SecondsAt(film_.whole(), range.first) -
+                                  SecondsAt(film_.whole(), film_.range().first),
+                        .frames = range.size()},
+            .line = outcome.Text(),
+            .object = outcome.Json()};
+  if (choice) {
+    told.object["choice"] = choice->Json();
+    told.line += "; " + choice->Text();
   }
-  told.outcome.frames = told.range.size();
-  told.outcome.begins =
-      SecondsAt(film_.whole(), told.range.first) - SecondsAt(film_.whole(), film_.range().first);
   shots_.push_back(std::move(told));
 }
 
@@ -134,7 +139,6 @@ void FilmOutcome::Tell(ProgressLine& progress) const {
   nlohmann::ordered_json list = nlohmann::ordered_json::array();
   for (std::size_t s = 0; s < shots_.size(); ++s) {
     const Told& told = shots_[s];
-    if (told.line.empty()) continue;
     outcomes.push_back(told.outcome);
     nlohmann::ordered_json object;
     object["first_frame"] = told.range.first;
@@ -153,6 +157,19 @@ void FilmOutcome::Tell(ProgressLine& progress) const {
   nlohmann::ordered_json object = film.Json();
   object["shots"] = list;
   progress.End(std::to_string(shots_.size()) + " shots: " + film.Text(), object);
+}
+
+void TellSavedOutcome(const host::Film& film, ProgressLine& progress) {
+  FilmOutcome outcome(film);
+  const std::vector<host::SavedShot>& shots = film.Saved().shots;
+  for (std::size_t s = 0; s < shots.size(); ++s) {
+    const std::optional<host::Choice> choice = host::Choice::Parse(shots[s].choice);
+    if (!choice) continue;
+    const auto first = static_cast<std::size_t>(shots[s].start_frame);
+    outcome.Add(s, {first, first + static_cast<std::size_t>(shots[s].length)},
+                choice->best().outcome, &*choice);
+  }
+  outcome.Tell(progress);
 }
 
 void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::string& project,

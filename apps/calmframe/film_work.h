@@ -32,6 +32,9 @@ class FilmOutcome {
   explicit FilmOutcome(const host::Film& film) : film_(film) {}
   // Of the film's open shot, after it was framed.
   void Add(host::SteadyClip& shot);
+  // Of the film's shot of that number, from 0. choice: null where nothing was to choose.
+  void Add(std::size_t number, const media::FrameRange& range, const host::Outcome& outcome,
+           const host::Choice* choice);
   void Tell(ProgressLine& progress) const;
 
  private:
@@ -45,6 +48,10 @@ class FilmOutcome {
   const host::Film& film_;
   std::vector<Told> shots_;
 };
+
+// The same of a film whose shots are saved with what was chosen for them; those without are left
+// out.
+void TellSavedOutcome(const host::Film& film, ProgressLine& progress);
 
 // Works, frames and draws the film shot by shot, those that have frames of `part`, which is of the
 // whole clip and goes to the writers. `project`: where the work is left; empty for none. Throws

@@ -175,15 +175,17 @@ int Run(int argc, char** argv) {
   ReportCommand report(program);
   BatchJobCommand batch_job(program);
   BatchPicturesCommand batch_pictures(program);
+  BatchShotsCommand batch_shots(program);
   WriteCommand man_page(program, "write-man-page", [](const CLI::App& app) {
     return manual::ManPage(app, CALMFRAME_VERSION);
   });
   WriteCommand bash(program, "write-bash-completion", manual::BashCompletion);
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
-  Command* const commands[] = {&stabilize, &batch,          &demo,      &analyze, &params, &shots,
-                               &render,    &info,           &tracks,    &report,  &gather, &join,
-                               &man_page,  &batch_pictures, &batch_job, &bash,    &zsh,    &fish};
+  Command* const commands[] = {
+      &stabilize,   &batch,     &demo,   &analyze, &params, &shots,    &render,
+      &info,        &tracks,    &report, &gather,  &join,   &man_page, &batch_pictures,
+      &batch_shots, &batch_job, &bash,   &zsh,     &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;

@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "host/media/segment_join.h"
@@ -81,6 +82,7 @@ void JoinCommand::Run() {
   shown.ends = true;
   progress.Show(shown);
   for (const std::string& line : left_out) progress.Warn(line);
+  TellSavedOutcome(*film, progress);
 }
 
 }  // namespace calmframe

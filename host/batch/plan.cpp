@@ -83,7 +83,7 @@ void AddTasks(const std::vector<FoundClip>& clips, const std::string& name_templ
 std::optional<Record> DoneRecord(const Plan& plan, const Task& task) {
   std::optional<Record> record = ReadRecord(plan.FolderOf(task).record());
   if (!record || record->state != Record::State::done || record->source != task.source ||
-      record->settings != plan.settings || !record->output_identity ||
+      record->settings != plan.SettingsOf(task) || !record->output_identity ||
       IdentityOf(task.source) != record->source_identity ||
       IdentityOf(plan.OutputOf(task)) != record->output_identity) {
     return std::nullopt;
@@ -133,6 +133,10 @@ std::string TextOf(const Plan& plan) {
                      {"output", JsonOfBytes(task.output)},
                      {"cost", task.cost},
                      {"memory", task.memory}});
+    if (task.words.empty()) continue;
+    auto& words = tasks.back()["words"] = nlohmann::ordered_json::array();
+    for (const std::string& word : task.words) words.push_back(JsonOfBytes(word));
+    tasks.back()["is_piece"] = task.is_piece;
   }
   return json.dump(1) + "\n";
 }
@@ -153,6 +157,10 @@ Plan PlanOf(const std::string& text) {
     task.output = BytesOf(entry.at("output"));
     task.cost = entry.at("cost").get<double>();
     task.memory = entry.at("memory").get<std::int64_t>();
+    if (entry.contains("words")) {
+      for (const auto& word : entry.at("words")) task.words.push_back(BytesOf(word));
+      task.is_piece = entry.at("is_piece").get<bool>();
+    }
     plan.tasks.push_back(std::move(task));
   }
   return plan;

@@ -16,6 +16,9 @@ namespace calmframe::batch {
 // The program's exit codes that stand in records.
 constexpr int kUsageCode = 2, kInputCode = 3, kOutputCode = 4, kWorkCode = 5;
 
+// Stands in a task's words for the file that it writes.
+inline constexpr char kOutputWord[] = "{output}";
+
 // One clip -> one output, with its project beside it.
 struct Task {
   std::string clip = {};    // as whoever asked for it calls it
@@ -24,6 +27,9 @@ struct Task {
   // Of one that can't be begun: why, in words, and the exit code that it stands for.
   std::string refused = {};
   int refused_code = 0;
+  // What the program is to do of it, in place of steadying it: a command and its words.
+  std::vector<std::string> words = {};
+  bool is_piece = false;  // of a film's work: its words are its settings, and nobody looks at it
   // What it is expected to take, by what its container says: the pixels of all frames, and bytes.
   double cost = 0;
   std::int64_t memory = 0;
@@ -46,6 +52,9 @@ struct Plan {
   std::string OutputOf(const Task& task) const { return folder + "/" + task.output; }
   std::string ProjectOf(const Task& task) const { return OutputOf(task) + ".calm"; }
   std::string ReportOf(const Task& task) const { return OutputOf(task) + ".html"; }
+  const std::vector<std::string>& SettingsOf(const Task& task) const {
+    return task.is_piece ? task.words : settings;
+  }
   TaskFolder FolderOf(const Task& task) const { return {folder, task.output}; }
 };
 

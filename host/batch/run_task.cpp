@@ -97,27 +97,18 @@ class Run {
     const std::optional<Record> before = ReadRecord(folder_.record());
     record.run = plan_.run;
     record.source = task_.source;
-    record.settings = plan_.settings;
+    record.settings = plan_.SettingsOf(task_);
     record.output = task_.output;
     if (before) record.output_identity = before->output_identity;
     const bool replaces = MayReplace();
     const auto identity = IdentityOf(task_.source);
     if (!identity) throw Failed{"is gone, or no file any more", kInputCode};
     record.source_identity = *identity;
-    DropStale(before);
+    if (task_.words.empty()) DropStale(before);
     Save();
 
-    std::vector<std::string> words = {plan_.program,
-                                      "stabilize",
-                                      task_.source,
-                                      written_,
-                                      "--project=" + plan_.ProjectOf(task_),
-                                      "--overwrite",
-                                      "--json",
-                                      "--threads=" + std::to_string(threads_)};
-    words.insert(words.end(), plan_.settings.begin(), plan_.settings.end());
     MakeFolder();
-    Program(words);
+    Program(Words());
     record.seconds = std::chrono::duration<double>(Clock::now() - began).count();
     if (IdentityOf(task_.source) != identity) {
       std::error_code ignored;
@@ -129,6 +120,7 @@ class Run {
 
   // What is made of an output beside it.
   void Describe() {
+    if (task_.is_piece) return;
     if (plan_.reports) {
       const std::vector<std::string> warnings = record.warnings;  // of the output, which hold here
       try {
@@ -159,6 +151,22 @@ class Run {
   }
 
  private:
+  std::vector<std::string> Words() const {
+    std::vector<std::string> words = {plan_.program};
+    if (task_.words.empty()) {
+      words.insert(words.end(), {"stabilize", task_.source, written_,
+                                 "--project=" + plan_.ProjectOf(task_), "--overwrite"});
+      words.insert(words.end(), plan_.settings.begin(), plan_.settings.end());
+    } else {
+      std::error_code ignored;
+      fs::remove(written_, ignored);  // of one that was killed
+      words.insert(words.end(), task_.words.begin(), task_.words.end());
+      for (std::string& word : words) ReplaceAll(word, kOutputWord, written_);
+    }
+    words.insert(words.end(), {"--json", "--threads=" + std::to_string(threads_)});
+    return words;
+  }
+
   // Nothing of others is written over, unless that was asked for.
   bool MayReplace() const {
     const auto there = IdentityOf(plan_.OutputOf(task_));
@@ -312,7 +320,7 @@ TaskResult RunLocked(const Plan& plan, const Task& task, int threads, TaskWatche
                      int lock) {
   std::optional<Record> done = DoneRecord(plan, task);
   std::error_code error;
-  if (done && (!plan.reports || fs::exists(plan.ReportOf(task), error))) {
+  if (done && (!plan.reports || task.is_piece || fs::exists(plan.ReportOf(task), error))) {
     return {TaskResult::State::unchanged, *std::move(done)};
   }
   Run run(plan, task, threads, watcher, lock);

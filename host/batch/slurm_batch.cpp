@@ -141,7 +141,8 @@ void SlurmBatch::Adopt() {
         ++alive;
         for (const std::size_t theirs : groups[g]) {
           const auto found = ours.find(plan.tasks.at(theirs).output);
-          if (found == ours.end() || plan.settings != plan_.settings ||
+          if (found == ours.end() ||
+              plan.SettingsOf(plan.tasks[theirs]) != plan_.SettingsOf(plan_.tasks[found->second]) ||
               plan.tasks[theirs].source != plan_.tasks[found->second].source) {
             continue;
           }

@@ -96,6 +96,29 @@ std::vector<ShotBorder> FindShots(const ClipMedium& medium, const media::FrameRa
   return source.borders();
 }
 
+std::vector<std::size_t> ShotStarts(const ClipMedium& medium, const ShotRequest& request,
+                                    Watcher& watcher) {
+  const media::FrameRange all{0, medium.info.frame_count};
+  std::vector<std::size_t> starts = {0};
+  if (const auto asked = StartsAsked(request, medium.info, all)) {
+    starts.insert(starts.end(), asked->begin(), asked->end());
+    return starts;
+  }
+  const auto is = [&](media::Standing standing) {
+    return medium.found && medium.found->standing() == standing;
+  };
+  try {
+    for (const ShotBorder& border : FindShots(medium, all, watcher)) {
+      starts.push_back(static_cast<std::size_t>(border.frame));
+    }
+  } catch (const media::Failure&) {
+    if (is(media::Standing::broken)) throw BrokenPromise();
+    throw;
+  }
+  if (!is(media::Standing::decoded)) throw BrokenPromise();
+  return starts;
+}
+
 Film::Film(const std::string& plugin, const std::string& path, Opening opening,
            const media::ClipReader::Part& part, const ShotRequest& request)
     : Film(plugin,

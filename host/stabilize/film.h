@@ -32,6 +32,12 @@ struct ShotRequest {
 std::vector<ShotBorder> FindShots(const ClipMedium& medium, const media::FrameRange& range,
                                   Watcher& watcher);
 
+// The first frames of a clip's shots, the clip's own first; found like that where the request
+// leaves it to that. Throws as FindShots, what the request's list throws, and BrokenPromise of a
+// clip that was opened by promises.
+std::vector<std::size_t> ShotStarts(const ClipMedium& medium, const ShotRequest& request,
+                                    Watcher& watcher);
+
 // A clip as one shot behind the other. Each is analysed, solved, framed and drawn as if it were a
 // clip of its own: an effect of its own on a layer that ends where the shot does, so that nothing
 // of one gets into another. One is open at a time, and a film takes the memory of its longest shot

@@ -89,6 +89,33 @@ TEST_F(BatchTest, AFolderWithABrokenClipIsSteadiedAndGoneOnWith) {
   EXPECT_THAT(Content("c/out/batch.html"), HasSubstr("<a href=\"./a-steady.mp4.html\">report</a>"));
 }
 
+// Two shots, analysed apart; stretches of frames that are no shots, drawn apart.
+TEST_F(BatchTest, AFilmInPiecesComesOutAsAWhole) {
+  MakeClip("film.mp4", 160, 120, 40);
+  const std::string whole =
+      "film.mp4 --shots 18f --codec ffv1 --smoothness 30 --zoom-at-most 1.4 --quiet ";
+  const std::string split =
+      "batch " + whole + " --to out --name '{stem}.mkv' --split --frames-a-piece 15 ";
+  RunWell("stabilize " + whole + "out.mkv");
+  const Outcome outcome = Run(split + "--pixel-format nosuch");
+  EXPECT_EQ(outcome.code, 6);
+  EXPECT_THAT(outcome.text, HasSubstr("film.mp4: "));
+  EXPECT_THAT(outcome.text, HasSubstr("nosuch"));
+  RunWell(split);
+  EXPECT_THAT(In("out"), ElementsAre(".calmframe", "batch.html", "film.mkv", "film.mkv.calm"));
+  const auto a = ClipReader::Open(Path("out.mkv")), b = ClipReader::Open(Path("out/film.mkv"));
+  ASSERT_EQ(b->info().frame_count, 40u);
+  EXPECT_EQ(a->info().times, b->info().times);
+  for (std::size_t frame = 0; frame < 40; ++frame) {
+    EXPECT_TRUE(SamePixels(ReadFrame(*a, frame), ReadFrame(*b, frame))) << frame;
+  }
+  for (const char* again : {"--split --json", "--json"}) {
+    EXPECT_THAT(
+        States(RunWell("batch " + whole + " --to out --name '{stem}.mkv' " + again))["unchanged"],
+        ElementsAre("film.mp4"));
+  }
+}
+
 TEST_F(BatchTest, WhatCantBeBegunIsOneLine) {
   MakeClip("a.mp4", 64, 48, 4);
   MakeFile("empty.mp4", "");
