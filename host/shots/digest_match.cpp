@@ -12,6 +12,7 @@ namespace {
 
 using Area = FrameDigest::Area;
 
+constexpr int kColumns = FrameDigest::kColumns, kRows = FrameDigest::kRows;
 constexpr int kHalfColumns = FrameDigest::kHalfColumns, kHalfRows = FrameDigest::kHalfRows;
 
 // A variance of cells, in 255ths squared, that says nothing: what noise and a coder leave.
@@ -29,7 +30,7 @@ Area Moved(const Area& a, CellShift by) {
 // What either shows; bars of both are left out.
 Area SharedArea(const FrameDigest& a, const FrameDigest& b) {
   const Area area = Union(a.area, b.area);
-  return area.IsEmpty() ? Area{0, 0, FrameDigest::kColumns, FrameDigest::kRows} : area;
+  return area.IsEmpty() ? Area{0, 0, kColumns, kRows} : area;
 }
 
 // Whole cells of `half` within it.
@@ -123,8 +124,7 @@ HalfMatch BestShift(const FrameDigest& a, const FrameDigest& b, const Area& area
 // -- Blocks --
 
 constexpr int kBlocksAcross = 8, kBlocksDown = 4, kBlocks = kBlocksAcross * kBlocksDown;
-constexpr int kBlockWidth = FrameDigest::kColumns / kBlocksAcross,
-              kBlockHeight = FrameDigest::kRows / kBlocksDown;
+constexpr int kBlockWidth = kColumns / kBlocksAcross, kBlockHeight = kRows / kBlocksDown;
 // How far a block may lie beside the frame's shift, in cells, a 64th of the width each: what a turn
 // by some degrees, a zoom or depth do from one frame to the next.
 constexpr int kBeside = 3;
@@ -138,9 +138,8 @@ Moments BlockMoments(const FrameDigest& a, const FrameDigest& b, const Area& in_
   std::int32_t n = in_a.size(), sa = 0, sb = 0, aa = 0, bb = 0, ab = 0;
   const int width = in_a.right - in_a.left;
   for (int y = in_a.top; y < in_a.bottom; ++y) {
-    const std::uint8_t* const p = a.cells.data() + y * FrameDigest::kColumns + in_a.left;
-    const std::uint8_t* const q =
-        b.cells.data() + (y + by.y) * FrameDigest::kColumns + in_a.left + by.x;
+    const std::uint8_t* const p = a.cells.data() + y * kColumns + in_a.left;
+    const std::uint8_t* const q = b.cells.data() + (y + by.y) * kColumns + in_a.left + by.x;
     for (int x = 0; x < width; ++x) {
       sa += p[x];
       sb += q[x];
@@ -274,17 +273,14 @@ FrameDigest InTonesOf(const FrameDigest& first, const FrameDigest& second, CellS
   constexpr double kFew = 4;  // cells, fewer of which say nothing
   std::array<double, kTones> sums{}, counts{};
   const Area shared =
-      Intersection(SharedArea(first, second),
-                   Moved({0, 0, FrameDigest::kColumns, FrameDigest::kRows}, {-shift.x, -shift.y}));
+      Intersection(SharedArea(first, second), Moved({0, 0, kColumns, kRows}, {-shift.x, -shift.y}));
   for (int y = shared.top; y < shared.bottom; ++y) {
     for (int x = shared.left; x < shared.right; ++x) {
-      const double tone =
-          first.cells[static_cast<std::size_t>(y * FrameDigest::kColumns + x)] / kStep;
+      const double tone = first.cells[static_cast<std::size_t>(y * kColumns + x)] / kStep;
       const auto k = static_cast<std::size_t>(std::min(tone, kTones - 1.001));
       const double part = tone - static_cast<double>(k);
       const double value =
-          second
-              .cells[static_cast<std::size_t>((y + shift.y) * FrameDigest::kColumns + x + shift.x)];
+          second.cells[static_cast<std::size_t>((y + shift.y) * kColumns + x + shift.x)];
       sums[k] += (1 - part) * value;
       counts[k] += 1 - part;
       sums[k + 1] += part * value;

@@ -61,6 +61,28 @@ double ShareIn(std::int64_t frame, std::int64_t pure_before, std::int64_t pure_b
       0.0, 1.0);
 }
 
+// Of the frames from `first` to before `end`, those that show a mixture well.
+std::vector<Triple> TriplesBetween(const FrameHistory& history, std::int64_t first,
+                                   std::int64_t end, std::int64_t step) {
+  std::vector<Triple> triples;
+  for (const std::int64_t width : kWidths) {
+    for (std::int64_t a = first; a + 2 * width * step < end; a += step) {
+      const std::optional<Mixture> m =
+          MixtureAt(history, a, a + width * step, a + 2 * width * step, 0);
+      if (!m) continue;
+      const double alone = std::max(m->first_left, m->second_left);
+      const double sum = m->first_weight + m->second_weight;
+      if (!(m->left < kLeft * alone && alone > kAlone && sum > kSureSum[0] && sum < kSureSum[1])) {
+        continue;
+      }
+      const std::int64_t at = (a - first) / step;
+      triples.push_back({at, at + width, at + 2 * width, std::clamp(ShareOf(*m), 0.0, 1.0),
+                         std::min(1.0, alone * alone / (kFull * kFull))});
+    }
+  }
+  return triples;
+}
+
 struct Span {
   std::int64_t before = 0, behind = 0;  // the last pure frame of one shot, the first of the other
 };
@@ -169,9 +191,9 @@ std::optional<ShotBorder> DissolveSearch::BorderOf(const FrameHistory& history) 
   const Hit best = *std::max_element(hits_.begin(), hits_.end(), [](const Hit& a, const Hit& b) {
     return a.strength < b.strength;
   });
-  double strengths = 0;
-  for (const Hit& hit : hits_) strengths += hit.strength;
-  const double margin = strengths * best.strength / kStrong;
+  double sum = 0;
+  for (const Hit& hit : hits_) sum += hit.strength;
+  const double margin = sum * best.strength / kStrong;
   // Three frames in a row are no accident, but of the shortest dissolves there are no more.
   if (margin < 1 || (hits_.size() < 3 && best.width > 2 * step_)) return {};
 
@@ -183,24 +205,10 @@ std::optional<ShotBorder> DissolveSearch::BorderOf(const FrameHistory& history) 
   }
   const std::int64_t first = std::max({best.first, history.first(), first_sure - kBeyond * step_});
   const std::int64_t end = std::min({best.end, history.end(), last_sure + kBeyond * step_ + 1});
-  std::vector<Triple> triples;
-  for (const std::int64_t width : kWidths) {
-    for (std::int64_t f = first + width * step_; f + width * step_ < end; f += step_) {
-      const std::int64_t a = f - width * step_, b = f + width * step_;
-      const std::optional<Mixture> m = MixtureAt(history, a, f, b, 0);
-      if (!m) continue;
-      const double alone = std::max(m->first_left, m->second_left);
-      const double sum = m->first_weight + m->second_weight;
-      const std::int64_t at = (a - first) / step_;
-      if (!(m->left < kLeft * alone && alone > kAlone && sum > kSureSum[0] && sum < kSureSum[1])) {
-        continue;
-      }
-      triples.push_back({at, at + width, at + 2 * width, std::clamp(ShareOf(*m), 0.0, 1.0),
-                         std::min(1.0, alone * alone / (kFull * kFull))});
-    }
-  }
+  const std::vector<Triple> triples = TriplesBetween(history, first, end, step_);
   const Span span = BestSpan(triples, (end - first + step_ - 1) / step_,
                              (first_sure - first) / step_, (last_sure - first) / step_);
+  if (span.behind <= span.before) return {};
   ShotBorder border;
   border.kind = ShotBorder::Kind::dissolve;
   border.first = first + span.before * step_ + 1;
