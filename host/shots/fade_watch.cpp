@@ -81,12 +81,12 @@ std::optional<ShotBorder> FadeWatch::Next(const FrameHistory& history, std::int6
   const double contrast = history.contrast(frame);
   std::optional<ShotBorder> border;
   if (state_ == State::rising && frame - rise_ >= second_ / 2) {
-    border = Judge(history);
+    border = Judge(history, history.end());
     state_ = State::clear;
   }
   if (state_ == State::rising && contrast < kLow * before_contrast_ && contrast < kPlain) {
     // Down again.
-    border = Judge(history);
+    border = Judge(history, history.end());
     state_ = State::clear;
   }
   // There was a cut to a picture of less contrast.
@@ -109,15 +109,17 @@ std::optional<ShotBorder> FadeWatch::Next(const FrameHistory& history, std::int6
   return border;
 }
 
-std::optional<ShotBorder> FadeWatch::Finish(const FrameHistory& history) {
+std::optional<ShotBorder> FadeWatch::Finish(const FrameHistory& history, std::int64_t end) {
   std::optional<ShotBorder> border;
-  if (state_ == State::rising) border = Judge(history);
-  state_ = State::clear;
+  if (state_ == State::rising && rise_ < end) {
+    border = Judge(history, end);
+    state_ = State::clear;
+  }
   return border;
 }
 
-std::optional<ShotBorder> FadeWatch::Judge(const FrameHistory& history) const {
-  const std::int64_t behind = WholeFrom(history, rise_, 1, second_ / 2);
+std::optional<ShotBorder> FadeWatch::Judge(const FrameHistory& history, std::int64_t end) const {
+  const std::int64_t behind = WholeFrom(history, rise_, 1, std::min(second_ / 2, end - 1 - rise_));
   const double less = std::min(before_contrast_, history.contrast(behind));
   if (!(least_ < kLow * less) || !before_fades_) return {};
   if (!FadesFrom(history, behind, plain_last_ - behind)) return {};

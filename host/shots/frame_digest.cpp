@@ -119,8 +119,7 @@ FrameDigest DigestOfCells(const Cells& cells) {
     const std::uint8_t* const row = digest.cells.data() + 2 * y * kWide;
     std::uint8_t* const out = digest.half.data() + y * FrameDigest::kHalfColumns;
     for (int x = 0; x < FrameDigest::kHalfColumns; ++x) {
-      const int sum =
-          row[2 * x] + row[2 * x + 1] + row[kWide + 2 * x] + row[kWide + 2 * x + 1];
+      const int sum = row[2 * x] + row[2 * x + 1] + row[kWide + 2 * x] + row[kWide + 2 * x + 1];
       out[x] = static_cast<std::uint8_t>((sum + 2) >> 2);
     }
   }

@@ -45,15 +45,18 @@ FrameDigest::Area FrameHistory::SteadyArea(const FrameDigest::Area& last) const 
 }
 
 void FrameHistory::Add(const FrameDigest& digest) {
-  Entry entry{digest, digest.area, {}, {}, {}};
-  entry.digest.area = SteadyArea(digest.area);
+  Entry& entry = entries_[static_cast<std::size_t>(end_) % entries_.size()];
+  // Ahead of the entry, which is an old frame's.
+  const FrameDigest::Area steady = SteadyArea(digest.area);
+  entry = Entry{digest, digest.area, {}, {}, {}, {}};
+  entry.digest.area = steady;
+  entry.detail = DetailOf(entry.digest);
   entry.tone = ToneOf(entry.digest);
   if (end_ > 0) {
     const Entry& before = At(end_ - 1);
     entry.match = MatchOf(before.digest, entry.digest);
     entry.place = before.place + entry.match.shift;
   }
-  entries_[static_cast<std::size_t>(end_) % entries_.size()] = entry;
   ++end_;
 }
 

@@ -6,6 +6,7 @@
 
 #include "host/shots/digest_match.h"
 #include "host/shots/frame_digest.h"
+#include "host/shots/mixture.h"
 
 namespace calmframe::host {
 
@@ -21,6 +22,7 @@ class FrameHistory {
   bool Holds(std::int64_t frame) const { return first() <= frame && frame < end_; }
 
   const FrameDigest& digest(std::int64_t frame) const { return At(frame).digest; }
+  const FrameDetail& detail(std::int64_t frame) const { return At(frame).detail; }
   // From the frame before; nothing of the film's first and of frames that are not kept.
   DigestMatch match(std::int64_t frame) const {
     return Holds(frame) ? At(frame).match : DigestMatch{};
@@ -44,6 +46,7 @@ class FrameHistory {
   struct Entry {
     FrameDigest digest;      // with the area of the frames about it
     FrameDigest::Area area;  // its own
+    FrameDetail detail;
     DigestMatch match;
     CellShift place;  // the sum of the shifts so far
     Tone tone;

@@ -63,34 +63,5 @@ TEST(DigestMatchTest, ALampThatGoesOnIsTakenForLight) {
   EXPECT_LE(DifferenceButForLight(dark, other, match), match.difference);
 }
 
-TEST(DigestMatchTest, AMixtureHasItsWeightsWhereverBothLie) {
-  const FrameDigest a = Drawn(1), b = Drawn(2);
-  for (const double share : {0.2, 0.5, 0.7}) {
-    // A has moved by (4, 2), B by (-2, 4), and the light has been raised.
-    const FrameDigest frame = DrawDigest([=](double x, double y) {
-      return 10 + (1 - share) * Waves(1, x - 4, y - 2) + share * Waves(2, x + 2, y - 4);
-    });
-    // As the motion from frame to frame would tell, but for some cells.
-    const auto mixture = MixtureOf(a, frame, b, {6, 0}, {0, 4}, 0.05);
-    ASSERT_TRUE(mixture);
-    EXPECT_NEAR(mixture->first_weight, 1 - share, 0.05);
-    EXPECT_NEAR(mixture->second_weight, share, 0.05);
-    EXPECT_LT(mixture->left, 0.02);
-    // Of pictures without anything in common, and of equal contrast.
-    const double first = (1 - share) * (1 - share), second = share * share;
-    EXPECT_NEAR(mixture->first_left, second / (first + second), 0.15);
-    EXPECT_NEAR(mixture->second_left, first / (first + second), 0.15);
-  }
-}
-
-TEST(DigestMatchTest, NoMixtureOfWhatMovesOnlyOrLiesTooFarAway) {
-  const FrameDigest a = Drawn(1);
-  EXPECT_FALSE(MixtureOf(a, Drawn(1, 2), Drawn(1, 4), {2, 0}, {-2, 0}, 0.05));
-  EXPECT_FALSE(MixtureOf(a, Drawn(2), Drawn(3), {60, 0}, {0, 0}, 0));
-  const auto of_another = MixtureOf(a, Drawn(3), Drawn(2), {}, {}, 0.05);
-  ASSERT_TRUE(of_another);
-  EXPECT_GT(of_another->left, 0.4 * std::min(of_another->first_left, of_another->second_left));
-}
-
 }  // namespace
 }  // namespace calmframe::host
