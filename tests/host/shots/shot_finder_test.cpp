@@ -17,13 +17,17 @@ constexpr int kFilmWidth = 128, kFilmHeight = 72;
 using Pixels = std::vector<HX_Pixel8>;
 
 // A street, shaken, from a camera turned aside by `aside` radians.
-synthetic::scene Street(int seed, double aside = 0, const std::vector<int>& whip_pans = {}) {
+// `lorry`: a board half as wide as the frame crosses it within so many frames.
+synthetic::scene Street(int seed, double aside = 0, const std::vector<int>& whip_pans = {},
+                        int lorry = 0) {
   synthetic::scene_options options;
   options.width = kFilmWidth;
   options.height = kFilmHeight;
   options.noise = 2;
   options.gain = 0.03;
   options.seed = static_cast<std::uint64_t>(seed);
+  options.occluder = lorry > 0;
+  options.frame_count = lorry;
   options.exposure = [=](int frame) {
     for (const int start : whip_pans) {
       if (frame >= start && frame <= start + 8) return 0.5;
@@ -105,6 +109,63 @@ TEST(ShotFinderTest, ADrawnFilm) {
     EXPECT_LE(border.confidence, 1);
     EXPECT_LE(told[i].behind, border.kind == ShotBorder::Kind::cut ? ShotFinder::kCutLag : 45) << i;
   }
+}
+
+// Thirty cuts, ten dissolves, two fades; in the shots ten flashes and stroboscopes, ten whip pans,
+// ten lorries.
+TEST(ShotFinderTest, ALongFilm) {
+  constexpr int kShots = 43;
+  std::vector<std::unique_ptr<synthetic::scene>> scenes;
+  std::vector<synthetic::film_shot> shots;
+  std::vector<synthetic::film_light> lights;
+  std::vector<ShotBorder> expected;
+  int frame = 0;
+  for (int k = 0; k < kShots; ++k) {
+    const bool fades = k == 21 || k == 42, mixed = fades || k % 4 == 2;
+    const int frames = 20 + 7 * k % 17;
+    const int length = fades ? 16 : mixed ? 8 + 7 * (k / 4) % 33 : 0;
+    // Ahead of them lie the frames in which the shot comes up, behind those in which it goes.
+    const std::vector<int> whips =
+        k % 4 == 1 ? std::vector{length + frames / 2} : std::vector<int>();
+    scenes.push_back(std::make_unique<synthetic::scene>(
+        Street(10 + k, 0.4 * (k % 5 - 2), whips, k % 4 == 3 ? frames + length : 0)));
+    shots.push_back({scenes.back().get(), 0, frames, length, fades});
+    if (k > 0) {
+      const ShotBorder::Kind kind = fades   ? ShotBorder::Kind::fade
+                                    : mixed ? ShotBorder::Kind::dissolve
+                                            : ShotBorder::Kind::cut;
+      expected.push_back({frame + length / 2, frame, frame + std::max(length - 1, 0), kind});
+    }
+    frame += length;
+    if (k % 4 == 0) {
+      for (int flash = 0; flash <= k % 8 / 2; ++flash) {
+        lights.push_back({frame + 8 + 4 * flash, 1 + k % 3, 2.5, 60});
+      }
+    }
+    frame += frames;
+  }
+  const synthetic::film film(shots, lights);
+  const std::vector<Told> told = Find(film.frame_count(), [&](int f) { return film.render(f); });
+  std::size_t next = 0;
+  int dissolves = 0, found = 0;
+  for (const ShotBorder& border : expected) {
+    const bool is_cut = border.kind == ShotBorder::Kind::cut;
+    const bool is_found = next < told.size() && border.first <= told[next].border.frame &&
+                          told[next].border.frame <= border.last;
+    if (border.kind == ShotBorder::Kind::dissolve) {
+      ++dissolves;
+      found += is_found;
+    } else {
+      EXPECT_TRUE(is_found) << border.frame;
+    }
+    if (!is_found) continue;
+    EXPECT_EQ(told[next].border.kind, border.kind) << border.frame;
+    EXPECT_TRUE(is_cut || told[next].behind < 60) << border.frame;
+    ++next;
+  }
+  // Nothing else is told, and all is in order.
+  EXPECT_EQ(next, told.size()) << "at " << told[std::min(next, told.size() - 1)].border.frame;
+  EXPECT_GE(10 * found, 8 * dissolves) << found << " of " << dissolves;
 }
 
 // One shot in which something happens that is no cut.
