@@ -12,11 +12,11 @@ namespace {
 
 using Area = FrameDigest::Area;
 
+constexpr int kColumns = FrameDigest::kColumns, kRows = FrameDigest::kRows;
 constexpr int kHalfColumns = FrameDigest::kHalfColumns, kHalfRows = FrameDigest::kHalfRows;
 
 // A variance of cells, in 255ths squared, that says nothing: what noise and a coder leave.
-// Of a mean of four cells it leaves less.
-constexpr double kNoise = 4, kHalfNoise = 1;
+constexpr double kNoise = 4;
 
 Area Intersection(const Area& a, const Area& b) {
   return {std::max(a.left, b.left), std::max(a.top, b.top), std::min(a.right, b.right),
@@ -29,7 +29,7 @@ Area Moved(const Area& a, CellShift by) {
 // What either shows; bars of both are left out.
 Area SharedArea(const FrameDigest& a, const FrameDigest& b) {
   const Area area = Union(a.area, b.area);
-  return area.IsEmpty() ? Area{0, 0, FrameDigest::kColumns, FrameDigest::kRows} : area;
+  return area.IsEmpty() ? Area{0, 0, kColumns, kRows} : area;
 }
 
 // Whole cells of `half` within it.
@@ -123,8 +123,7 @@ HalfMatch BestShift(const FrameDigest& a, const FrameDigest& b, const Area& area
 // -- Blocks --
 
 constexpr int kBlocksAcross = 8, kBlocksDown = 4, kBlocks = kBlocksAcross * kBlocksDown;
-constexpr int kBlockWidth = FrameDigest::kColumns / kBlocksAcross,
-              kBlockHeight = FrameDigest::kRows / kBlocksDown;
+constexpr int kBlockWidth = kColumns / kBlocksAcross, kBlockHeight = kRows / kBlocksDown;
 // How far a block may lie beside the frame's shift, in cells, a 64th of the width each: what a turn
 // by some degrees, a zoom or depth do from one frame to the next.
 constexpr int kBeside = 3;
@@ -138,9 +137,8 @@ Moments BlockMoments(const FrameDigest& a, const FrameDigest& b, const Area& in_
   std::int32_t n = in_a.size(), sa = 0, sb = 0, aa = 0, bb = 0, ab = 0;
   const int width = in_a.right - in_a.left;
   for (int y = in_a.top; y < in_a.bottom; ++y) {
-    const std::uint8_t* const p = a.cells.data() + y * FrameDigest::kColumns + in_a.left;
-    const std::uint8_t* const q =
-        b.cells.data() + (y + by.y) * FrameDigest::kColumns + in_a.left + by.x;
+    const std::uint8_t* const p = a.cells.data() + y * kColumns + in_a.left;
+    const std::uint8_t* const q = b.cells.data() + (y + by.y) * kColumns + in_a.left + by.x;
     for (int x = 0; x < width; ++x) {
       sa += p[x];
       sb += q[x];
@@ -274,17 +272,14 @@ FrameDigest InTonesOf(const FrameDigest& first, const FrameDigest& second, CellS
   constexpr double kFew = 4;  // cells, fewer of which say nothing
   std::array<double, kTones> sums{}, counts{};
   const Area shared =
-      Intersection(SharedArea(first, second),
-                   Moved({0, 0, FrameDigest::kColumns, FrameDigest::kRows}, {-shift.x, -shift.y}));
+      Intersection(SharedArea(first, second), Moved({0, 0, kColumns, kRows}, {-shift.x, -shift.y}));
   for (int y = shared.top; y < shared.bottom; ++y) {
     for (int x = shared.left; x < shared.right; ++x) {
-      const double tone =
-          first.cells[static_cast<std::size_t>(y * FrameDigest::kColumns + x)] / kStep;
+      const double tone = first.cells[static_cast<std::size_t>(y * kColumns + x)] / kStep;
       const auto k = static_cast<std::size_t>(std::min(tone, kTones - 1.001));
       const double part = tone - static_cast<double>(k);
       const double value =
-          second
-              .cells[static_cast<std::size_t>((y + shift.y) * FrameDigest::kColumns + x + shift.x)];
+          second.cells[static_cast<std::size_t>((y + shift.y) * kColumns + x + shift.x)];
       sums[k] += (1 - part) * value;
       counts[k] += 1 - part;
       sums[k + 1] += part * value;
@@ -318,108 +313,6 @@ double DifferenceButForLight(const FrameDigest& first, const FrameDigest& second
   const FrameDigest toned_second = InTonesOf(second, first, {-match.shift.x, -match.shift.y});
   return std::min({match.difference, BlocksAbout(toned_first, second, area, match.shift).difference,
                    BlocksAbout(first, toned_second, area, match.shift).difference});
-}
-
-// -- Mixtures --
-
-namespace {
-
-// Frame = a * A + b * B + offset over where both lie, A and B at their places in it.
-Mixture Fit(const FrameDigest& a, const FrameDigest& frame, const FrameDigest& b, const Area& area,
-            CellShift from_a, CellShift from_b, double least) {
-  const Area shared = Intersection(Intersection(area, Moved(area, from_a)), Moved(area, from_b));
-  if (shared.IsEmpty() || shared.size() < least * area.size()) return {};
-  std::int32_t sa = 0, sb = 0, sf = 0, aa = 0, bb = 0, ff = 0, ab = 0, af = 0, bf = 0;
-  for (int y = shared.top; y < shared.bottom; ++y) {
-    const std::uint8_t* const f = frame.half.data() + y * kHalfColumns + shared.left;
-    const std::uint8_t* const p =
-        a.half.data() + (y - from_a.y) * kHalfColumns + shared.left - from_a.x;
-    const std::uint8_t* const q =
-        b.half.data() + (y - from_b.y) * kHalfColumns + shared.left - from_b.x;
-    const int width = shared.right - shared.left;
-    for (int x = 0; x < width; ++x) {
-      sa += p[x], sb += q[x], sf += f[x];
-      aa += p[x] * p[x], bb += q[x] * q[x], ff += f[x] * f[x];
-      ab += p[x] * q[x], af += p[x] * f[x], bf += q[x] * f[x];
-    }
-  }
-  const double n = shared.size();
-  const auto centred = [n](std::int32_t product, std::int32_t x, std::int32_t y) {
-    return (product - 1.0 * x * y / n) / n;
-  };
-  const double vaa = centred(aa, sa, sa) + kHalfNoise, vbb = centred(bb, sb, sb) + kHalfNoise;
-  const double vff = centred(ff, sf, sf) + kHalfNoise, vab = centred(ab, sa, sb);
-  const double vaf = centred(af, sa, sf), vbf = centred(bf, sb, sf);
-  const double determinant = vaa * vbb - vab * vab;
-  Mixture m;
-  m.first_weight = (vaf * vbb - vbf * vab) / determinant;
-  m.second_weight = (vbf * vaa - vaf * vab) / determinant;
-  m.left = 1 - (m.first_weight * vaf + m.second_weight * vbf) / vff;
-  m.first_left = vaf > 0 ? 1 - vaf * vaf / (vaa * vff) : 1;
-  m.second_left = vbf > 0 ? 1 - vbf * vbf / (vbb * vff) : 1;
-  return m;
-}
-
-double LeftBy(const HalfMatch& match) {
-  const double c = std::max(0.0, match.correlation);
-  return 1 - c * c;
-}
-
-int Halved(int cells) {
-  return cells >= 0 ? (cells + 1) / 2 : -((1 - cells) / 2);
-}
-
-HalfMatch PlaceAlone(const FrameDigest& first, const FrameDigest& second, const Area& area,
-                     CellShift about) {
-  // How far the sums of rounded shifts may be off, in cells of `half`.
-  constexpr int kReachX = 5, kReachY = 4;
-  return BestShift(first, second, area, {Halved(about.x), Halved(about.y)}, kReachX, kReachY, 0.5,
-                   kHalfNoise);
-}
-
-}  // namespace
-
-std::optional<double> LeftAlone(const FrameDigest& first, const FrameDigest& second,
-                                CellShift second_from_first) {
-  const Area area = HalfOf(SharedArea(first, second));
-  const HalfMatch match = PlaceAlone(first, second, area, second_from_first);
-  if (match.correlation < -1) return {};
-  return LeftBy(match);
-}
-
-std::optional<Mixture> MixtureOf(const FrameDigest& a, const FrameDigest& frame,
-                                 const FrameDigest& b, CellShift frame_from_a,
-                                 CellShift frame_from_b, double worth) {
-  const Area area = HalfOf(SharedArea(a, b));
-  const HalfMatch alone_a = PlaceAlone(a, frame, area, frame_from_a);
-  const HalfMatch alone_b = PlaceAlone(b, frame, area, frame_from_b);
-  if (alone_a.correlation < -1 || alone_b.correlation < -1) return {};
-  if (LeftBy(alone_a) < worth || LeftBy(alone_b) < worth) return {};
-  // One and then the other moves to its best place beside the other (coordinate descent).
-  CellShift places[2] = {alone_a.shift, alone_b.shift};
-  constexpr double kLeastOfBoth = 0.3;
-  Mixture best = Fit(a, frame, b, area, places[0], places[1], kLeastOfBoth);
-  for (int round = 0; round < 3; ++round) {
-    bool moved = false;
-    for (int which = 0; which < 2; ++which) {
-      const CellShift middle = places[which];
-      for (int y = -2; y <= 2; ++y) {
-        for (int x = -2; x <= 2; ++x) {
-          CellShift tried[2] = {places[0], places[1]};
-          tried[which] = middle + CellShift{x, y};
-          const Mixture m = Fit(a, frame, b, area, tried[0], tried[1], kLeastOfBoth);
-          if (!(m.left < best.left && m.first_weight > 0 && m.second_weight > 0)) continue;
-          best = m;
-          places[which] = tried[which];
-          moved = true;
-        }
-      }
-    }
-    if (!moved) break;
-  }
-  best.first_left = LeftBy(alone_a);
-  best.second_left = LeftBy(alone_b);
-  return best;
 }
 
 }  // namespace calmframe::host

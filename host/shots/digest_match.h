@@ -1,7 +1,5 @@
 #pragma once
 
-#include <optional>
-
 #include "host/shots/frame_digest.h"
 
 namespace calmframe::host {
@@ -42,26 +40,5 @@ DigestMatch MatchOf(const FrameDigest& first, const FrameDigest& second);
 // which is of the same frames. Some 0.2 ms.
 double DifferenceButForLight(const FrameDigest& first, const FrameDigest& second,
                              const DigestMatch& match);
-
-// What the first frame leaves of the second's contrast at its best place, about the one that the
-// motion from frame to frame gives: a share of its square, 0 to 1. None where they share less than
-// half of the frame.
-std::optional<double> LeftAlone(const FrameDigest& first, const FrameDigest& second,
-                                CellShift second_from_first);
-
-// A frame as first_weight * A + second_weight * B + an offset, by least squares over where both
-// lie, each at its best place. What is left over is a share of the frame's contrast, 0 to 1.
-struct Mixture {
-  double first_weight = 0, second_weight = 0;
-  double left = 1;                         // by both
-  double first_left = 1, second_left = 1;  // by A alone, by B alone
-};
-
-// Where A and B lie in the frame is looked for about the places that the motion from frame to frame
-// gives. `worth`: nothing is fitted where A or B alone leave less than that. None where A and B
-// share less than half of the frame with it.
-std::optional<Mixture> MixtureOf(const FrameDigest& a, const FrameDigest& frame,
-                                 const FrameDigest& b, CellShift frame_from_a,
-                                 CellShift frame_from_b, double worth);
 
 }  // namespace calmframe::host

@@ -20,14 +20,14 @@ class FadeWatch {
   // Takes the history's last frame. `first`: with which its shot begins, as far as cuts tell. A
   // fade that is over by now, if there is one.
   std::optional<ShotBorder> Next(const FrameHistory& history, std::int64_t first);
-  // No more frames.
-  std::optional<ShotBorder> Finish(const FrameHistory& history);
+  // The shot ends before `end`: another begins there, or there are no more frames.
+  std::optional<ShotBorder> Finish(const FrameHistory& history, std::int64_t end);
 
  private:
   enum class State { clear, low, rising };
 
   void Begin(const FrameHistory& history, std::int64_t first);
-  std::optional<ShotBorder> Judge(const FrameHistory& history) const;
+  std::optional<ShotBorder> Judge(const FrameHistory& history, std::int64_t end) const;
 
   const std::int64_t second_;  // in frames
   State state_ = State::clear;

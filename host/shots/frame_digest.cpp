@@ -8,7 +8,7 @@
 namespace calmframe::host {
 namespace {
 
-constexpr int kColumns = FrameDigest::kColumns, kRows = FrameDigest::kRows;
+constexpr int kWide = FrameDigest::kColumns, kHigh = FrameDigest::kRows;
 // Pixels that are read of a cell. Of 32 the noise of a camera, some 5 of 255, leaves 1; a power of
 // two in all, so that a sum of lumas is a mean by a shift.
 constexpr int kAcross = 8, kDown = 4;
@@ -16,7 +16,7 @@ constexpr int kAcross = 8, kDown = 4;
 // than this, in 255ths.
 constexpr int kBlack = 24, kBarRange = 3;
 
-using Cells = std::array<std::uint8_t, kColumns * kRows>;
+using Cells = std::array<std::uint8_t, kWide * kHigh>;
 
 // Where the samples of an axis lie: in the middles of `count` even parts.
 template <std::size_t count>
@@ -31,12 +31,12 @@ std::array<int, count> Places(int size) {
 // luma_of(row, x): 0 to 255, times `unit`; `row` from row_of(y).
 template <class RowOf, class LumaOf>
 Cells MeansOf(int width, int height, int unit, const RowOf& row_of, const LumaOf& luma_of) {
-  const auto columns = Places<static_cast<std::size_t>(kColumns * kAcross)>(width);
-  const auto rows = Places<static_cast<std::size_t>(kRows * kDown)>(height);
+  const auto columns = Places<static_cast<std::size_t>(kWide * kAcross)>(width);
+  const auto rows = Places<static_cast<std::size_t>(kHigh * kDown)>(height);
   const int whole = unit * kAcross * kDown;
   Cells cells;
-  for (int y = 0; y < kRows; ++y) {
-    std::array<std::int32_t, kColumns> sums{};
+  for (int y = 0; y < kHigh; ++y) {
+    std::array<std::int32_t, kWide> sums{};
     for (int j = 0; j < kDown; ++j) {
       const auto* const row = row_of(rows[static_cast<std::size_t>(y * kDown + j)]);
       for (std::size_t x = 0; x < sums.size(); ++x) {
@@ -47,7 +47,7 @@ Cells MeansOf(int width, int height, int unit, const RowOf& row_of, const LumaOf
     }
     for (std::size_t x = 0; x < sums.size(); ++x) {
       const int mean = (sums[x] + whole / 2) / whole;
-      cells[static_cast<std::size_t>(y * kColumns) + x] =
+      cells[static_cast<std::size_t>(y * kWide) + x] =
           static_cast<std::uint8_t>(std::clamp(mean, 0, 255));
     }
   }
@@ -57,11 +57,11 @@ Cells MeansOf(int width, int height, int unit, const RowOf& row_of, const LumaOf
 // The frame without the black lines along its four edges.
 FrameDigest::Area WithoutBars(const Cells& cells) {
   const auto at = [&](int x, int y) {
-    return static_cast<int>(cells[static_cast<std::size_t>(y * kColumns + x)]);
+    return static_cast<int>(cells[static_cast<std::size_t>(y * kWide + x)]);
   };
-  FrameDigest::Area area{0, 0, kColumns, kRows};
+  FrameDigest::Area area{0, 0, kWide, kHigh};
   const auto row_is = [&](int y, int value) {
-    for (int x = 0; x < kColumns; ++x) {
+    for (int x = 0; x < kWide; ++x) {
       if (std::abs(at(x, y) - value) > kBarRange) return false;
     }
     return value <= kBlack;
@@ -72,39 +72,39 @@ FrameDigest::Area WithoutBars(const Cells& cells) {
     }
     return value <= kBlack;
   };
-  while (area.top < kRows && row_is(area.top, at(0, 0))) ++area.top;
-  while (area.bottom > area.top && row_is(area.bottom - 1, at(0, kRows - 1))) --area.bottom;
+  while (area.top < kHigh && row_is(area.top, at(0, 0))) ++area.top;
+  while (area.bottom > area.top && row_is(area.bottom - 1, at(0, kHigh - 1))) --area.bottom;
   if (area.IsEmpty()) return {};
-  while (area.left < kColumns && column_is(area.left, at(0, area.top))) ++area.left;
-  while (area.right > area.left && column_is(area.right - 1, at(kColumns - 1, area.top))) {
+  while (area.left < kWide && column_is(area.left, at(0, area.top))) ++area.left;
+  while (area.right > area.left && column_is(area.right - 1, at(kWide - 1, area.top))) {
     --area.right;
   }
   // The cell that is half bar, and what the smoothing spreads.
   constexpr int kEdge = 2;
   if (area.top > 0) area.top += kEdge;
-  if (area.bottom < kRows) area.bottom -= kEdge;
+  if (area.bottom < kHigh) area.bottom -= kEdge;
   if (area.left > 0) area.left += kEdge;
-  if (area.right < kColumns) area.right -= kEdge;
+  if (area.right < kWide) area.right -= kEdge;
   return area.IsEmpty() ? FrameDigest::Area{} : area;
 }
 
 // Weights 1, 2, 1 across and down; the edge's cells are repeated.
 Cells Smoothed(const Cells& cells) {
-  std::array<int, kColumns * kRows> across;
-  for (int y = 0; y < kRows; ++y) {
-    const std::uint8_t* const row = cells.data() + y * kColumns;
-    int* const out = across.data() + y * kColumns;
-    for (int x = 0; x < kColumns; ++x) {
-      out[x] = row[std::max(x - 1, 0)] + 2 * row[x] + row[std::min(x + 1, kColumns - 1)];
+  std::array<int, kWide * kHigh> across;
+  for (int y = 0; y < kHigh; ++y) {
+    const std::uint8_t* const row = cells.data() + y * kWide;
+    int* const out = across.data() + y * kWide;
+    for (int x = 0; x < kWide; ++x) {
+      out[x] = row[std::max(x - 1, 0)] + 2 * row[x] + row[std::min(x + 1, kWide - 1)];
     }
   }
   Cells smooth;
-  for (int y = 0; y < kRows; ++y) {
-    const int* const above = across.data() + std::max(y - 1, 0) * kColumns;
-    const int* const here = across.data() + y * kColumns;
-    const int* const below = across.data() + std::min(y + 1, kRows - 1) * kColumns;
-    for (int x = 0; x < kColumns; ++x) {
-      smooth[static_cast<std::size_t>(y * kColumns + x)] =
+  for (int y = 0; y < kHigh; ++y) {
+    const int* const above = across.data() + std::max(y - 1, 0) * kWide;
+    const int* const here = across.data() + y * kWide;
+    const int* const below = across.data() + std::min(y + 1, kHigh - 1) * kWide;
+    for (int x = 0; x < kWide; ++x) {
+      smooth[static_cast<std::size_t>(y * kWide + x)] =
           static_cast<std::uint8_t>((above[x] + 2 * here[x] + below[x] + 8) >> 4);
     }
   }
@@ -116,11 +116,10 @@ FrameDigest DigestOfCells(const Cells& cells) {
   digest.area = WithoutBars(cells);
   digest.cells = Smoothed(cells);
   for (int y = 0; y < FrameDigest::kHalfRows; ++y) {
-    const std::uint8_t* const row = digest.cells.data() + 2 * y * kColumns;
+    const std::uint8_t* const row = digest.cells.data() + 2 * y * kWide;
     std::uint8_t* const out = digest.half.data() + y * FrameDigest::kHalfColumns;
     for (int x = 0; x < FrameDigest::kHalfColumns; ++x) {
-      const int sum =
-          row[2 * x] + row[2 * x + 1] + row[kColumns + 2 * x] + row[kColumns + 2 * x + 1];
+      const int sum = row[2 * x] + row[2 * x + 1] + row[kWide + 2 * x] + row[kWide + 2 * x + 1];
       out[x] = static_cast<std::uint8_t>((sum + 2) >> 2);
     }
   }

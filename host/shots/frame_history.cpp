@@ -4,11 +4,9 @@
 #include <cmath>
 
 namespace calmframe::host {
-namespace {
-
-double ContrastOf(const FrameDigest& digest) {
+FrameHistory::Tone FrameHistory::ToneOf(const FrameDigest& digest) {
   const FrameDigest::Area& area = digest.area;
-  if (area.IsEmpty()) return 0;
+  if (area.IsEmpty()) return {};
   double sum = 0, squares = 0;
   for (int y = area.top; y < area.bottom; ++y) {
     for (int x = area.left; x < area.right; ++x) {
@@ -18,10 +16,8 @@ double ContrastOf(const FrameDigest& digest) {
     }
   }
   const double mean = sum / area.size();
-  return std::sqrt(std::max(0.0, squares / area.size() - mean * mean));
+  return {std::sqrt(std::max(0.0, squares / area.size() - mean * mean)), mean};
 }
-
-}  // namespace
 
 std::int64_t FrameHistory::first() const {
   return std::max<std::int64_t>(0, end_ - static_cast<std::int64_t>(entries_.size()));
@@ -49,15 +45,18 @@ FrameDigest::Area FrameHistory::SteadyArea(const FrameDigest::Area& last) const 
 }
 
 void FrameHistory::Add(const FrameDigest& digest) {
-  Entry entry{digest, digest.area, {}, {}, 0};
-  entry.digest.area = SteadyArea(digest.area);
-  entry.contrast = ContrastOf(entry.digest);
+  Entry& entry = entries_[static_cast<std::size_t>(end_) % entries_.size()];
+  // Ahead of the entry, which is an old frame's.
+  const FrameDigest::Area steady = SteadyArea(digest.area);
+  entry = Entry{digest, digest.area, {}, {}, {}, {}};
+  entry.digest.area = steady;
+  entry.detail = DetailOf(entry.digest);
+  entry.tone = ToneOf(entry.digest);
   if (end_ > 0) {
     const Entry& before = At(end_ - 1);
     entry.match = MatchOf(before.digest, entry.digest);
     entry.place = before.place + entry.match.shift;
   }
-  entries_[static_cast<std::size_t>(end_) % entries_.size()] = entry;
   ++end_;
 }
 

@@ -6,6 +6,7 @@
 
 #include "host/shots/digest_match.h"
 #include "host/shots/frame_digest.h"
+#include "host/shots/mixture.h"
 
 namespace calmframe::host {
 
@@ -21,6 +22,7 @@ class FrameHistory {
   bool Holds(std::int64_t frame) const { return first() <= frame && frame < end_; }
 
   const FrameDigest& digest(std::int64_t frame) const { return At(frame).digest; }
+  const FrameDetail& detail(std::int64_t frame) const { return At(frame).detail; }
   // From the frame before; nothing of the film's first and of frames that are not kept.
   DigestMatch match(std::int64_t frame) const {
     return Holds(frame) ? At(frame).match : DigestMatch{};
@@ -30,20 +32,26 @@ class FrameHistory {
   CellShift Motion(std::int64_t from, std::int64_t to) const {
     return At(to).place - At(from).place;
   }
-  // Standard deviation of the frame's luma, in 255ths.
-  double contrast(std::int64_t frame) const { return Holds(frame) ? At(frame).contrast : 0; }
+  // Standard deviation and mean of the frame's luma, in 255ths.
+  double contrast(std::int64_t frame) const { return Holds(frame) ? At(frame).tone.contrast : 0; }
+  double mean(std::int64_t frame) const { return Holds(frame) ? At(frame).tone.mean : 0; }
   double Difference(std::int64_t a, std::int64_t b) const {
     return MatchOf(digest(a), digest(b)).difference;
   }
 
  private:
+  struct Tone {
+    double contrast = 0, mean = 0;
+  };
   struct Entry {
     FrameDigest digest;      // with the area of the frames about it
     FrameDigest::Area area;  // its own
+    FrameDetail detail;
     DigestMatch match;
     CellShift place;  // the sum of the shifts so far
-    double contrast = 0;
+    Tone tone;
   };
+  static Tone ToneOf(const FrameDigest& digest);
   FrameDigest::Area SteadyArea(const FrameDigest::Area& last) const;
   const Entry& At(std::int64_t frame) const {
     return entries_[static_cast<std::size_t>(frame) % entries_.size()];

@@ -23,16 +23,15 @@ class ShotFinder::Search {
     history_.Add(digest);
     std::int64_t first = 0;
     for (const ShotBorder& border : lately_) first = std::max(first, border.frame);
-    Keep(fades_.Next(history_, first));
+    KeepFade(fades_.Next(history_, first));
     while (next_cut_ + kCutLag <= history_.end()) LookForCut();
     while (next_mixture_ + dissolves_.reach() + kCutLag < history_.end()) LookForMixture();
   }
 
   void Finish() {
     while (next_cut_ < history_.end()) LookForCut();
-    Keep(fades_.Finish(history_));
-    while (next_mixture_ < history_.end()) LookForMixture();
-    Keep(dissolves_.Finish(history_));
+    KeepFade(fades_.Finish(history_, history_.end()));
+    SettleMixtures(history_.end());
   }
 
   std::vector<ShotBorder> Take() {
@@ -46,13 +45,28 @@ class ShotFinder::Search {
     const std::int64_t frame = next_cut_++;
     if (frame == 0) return;
     if (const std::optional<double> confidence = CutAt(history_, frame)) {
+      KeepFade(fades_.Finish(history_, frame));
+      SettleMixtures(frame);
       Keep(ShotBorder{frame, frame, frame, ShotBorder::Kind::cut, *confidence});
     }
   }
 
-  void LookForMixture() {
+  // Borders are told in their order: what lies before one is decided first. No frame behind that
+  // one says anything about it.
+  void KeepFade(const std::optional<ShotBorder>& border) {
+    if (!border) return;
+    SettleMixtures(border->first);
+    Keep(border);
+  }
+  void SettleMixtures(std::int64_t end) {
+    while (next_mixture_ < end) LookForMixture(end);
+    Keep(dissolves_.Finish(history_));
+  }
+
+  void LookForMixture() { LookForMixture(history_.end()); }
+  void LookForMixture(std::int64_t end) {
     const std::int64_t frame = next_mixture_++;
-    std::int64_t first = 0, end = history_.end();
+    std::int64_t first = 0;
     for (const ShotBorder& border : lately_) {
       if (border.kind == ShotBorder::Kind::dissolve) continue;
       if (border.last < frame) first = std::max(first, border.last);

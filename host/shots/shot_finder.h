@@ -37,8 +37,9 @@ class ShotFinder {
   ~ShotFinder();
 
   void Add(const FrameDigest& digest);
-  // The borders that became certain since the last call, by `frame`; they stand. A dissolve or fade
-  // is told about a second behind its end, so behind a cut that follows it sooner.
+  // The borders that became certain since the last call, by `frame`, behind all that were told
+  // before; they stand. A dissolve or fade is told about a second behind its end, or when a cut
+  // that follows it sooner is.
   std::vector<ShotBorder> Take();
   // No more frames: what can be decided is decided. Nothing is added any more.
   void Finish();
