@@ -17,8 +17,8 @@ constexpr std::int64_t kWidths[] = {2, 4, 8, 14, 20};
 // dissolves; outside up to 0.15 where somebody runs through a crowd, so there is the evidence, see
 // EvidenceFor, which is nought there.
 constexpr double kWeak = 0.08;
-// The best strength times the evidence: 0.096 to 0.32 in the dissolves that are told, less than
-// 0.05 where there is none.
+// The best strength times the evidence: 0.096 to 0.32 in the dissolves that are told, up to
+// 0.079 where there is none.
 constexpr double kStrong = 0.08;
 // What either frame alone must leave of the one between: less is a picture that moved a little.
 constexpr double kAlone = 0.12;
