@@ -108,7 +108,7 @@ BatchCommand::BatchCommand(CLI::App& program)
       parser_, "--jobs", [this](int jobs) { jobs_ = jobs; }, "N", 1, 1024,
       "Clips at a time; at first as many as processors and memory allow");
   AddSwitch(parser_, "--reports", reports_,
-            "Make a page of each clip too, as report does, which takes about half as long again");
+            "Make a page of each clip too, as report does, which takes about a fifth longer");
   CLI::Option* const on = AddChoice(
       parser_, "--on", [this](const std::string& name) { on_ = name; }, {"here", "slurm"},
       "Where clips are worked: on this machine, or as jobs of Slurm on machines that see the "
@@ -118,7 +118,7 @@ BatchCommand::BatchCommand(CLI::App& program)
                                      "Further flags for sbatch, such as \"--partition=long "
                                      "--cpus-per-task=4 --mem=2G\"");
   CLI::Option* const clips = AddNumber<int>(
-      parser_, "--clips-a-job", [this](int count) { clips_a_job_ = count; }, "N", 1, 1000000,
+      parser_, "--clips-a-job", [this](int count) { clips_a_job_ = count; }, "N", 1, 1000,
       "Clips that a job does; at first as many as make some minute's work");
   CLI::Option* const detach =
       AddSwitch(parser_, "--detach", detaches_,
