@@ -58,20 +58,21 @@ void CheckParams(const ControlFlags& controls) {
   }
 }
 
-// The frame in a clip's middle, small.
+// A frame of a clip, small: not its first, which may be black, and one that is decoded soon.
 std::string PictureOf(const std::string& path) {
   constexpr int kWidth = 160;  // pixels
-  std::size_t middle = 0;
+  constexpr std::size_t kSoon = 25;
+  std::size_t shown = 0;
   const auto reader = media::ClipReader::OpenPromised(path, [&](const media::ClipInfo& clip) {
-    middle = clip.frame_count / 2;
-    return media::FrameRange{middle, middle + 1};
+    shown = std::min(clip.frame_count / 2, kSoon);
+    return media::FrameRange{shown, shown + 1};
   });
   const media::ClipInfo& info = reader->info();
-  middle = std::min(middle, info.frame_count - 1);
+  shown = std::min(shown, info.frame_count - 1);
   std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(info.width) *
                                 static_cast<std::size_t>(info.height));
   const std::ptrdiff_t row_bytes = info.width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8));
-  reader->Read(middle, pixels.data(), row_bytes);
+  reader->Read(shown, pixels.data(), row_bytes);
   return report::DataUrlOf(
       {pixels.data(), row_bytes, info.width, info.height,
        static_cast<double>(info.pixel_aspect.num) / static_cast<double>(info.pixel_aspect.den)},
@@ -113,7 +114,7 @@ BatchCommand::BatchCommand(CLI::App& program)
       parser_, "--jobs", [this](int jobs) { jobs_ = jobs; }, "N", 1, 1024,
       "Clips at a time; at first as many as processors and memory allow");
   AddSwitch(parser_, "--reports", reports_,
-            "Make a page of each clip too, as report does, which takes about half as long again");
+            "Make a page of each clip too, as report does, which takes about a fifth longer");
   CLI::Option* const on = AddChoice(
       parser_, "--on", [this](const std::string& name) { on_ = name; }, {"here", "slurm"},
       "Where clips are worked: on this machine, or as jobs of Slurm on machines that see the "
@@ -123,7 +124,7 @@ BatchCommand::BatchCommand(CLI::App& program)
                                      "Further flags for sbatch, such as \"--partition=long "
                                      "--cpus-per-task=4 --mem=2G\"");
   CLI::Option* const clips = AddNumber<int>(
-      parser_, "--clips-a-job", [this](int count) { clips_a_job_ = count; }, "N", 1, 1000000,
+      parser_, "--clips-a-job", [this](int count) { clips_a_job_ = count; }, "N", 1, 1000,
       "Clips that a job does; at first as many as make some minute's work");
   CLI::Option* const detach =
       AddSwitch(parser_, "--detach", detaches_,
