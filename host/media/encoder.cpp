@@ -1,6 +1,7 @@
 #include "host/media/encoder.h"
 
 #include <algorithm>
+#include <cstdlib>
 #include <cstring>
 
 #include "host/base/nearest_match.h"
@@ -27,6 +28,17 @@ std::vector<std::string> EncoderNames() {
     names.emplace_back(avcodec_get_name(codec->id));
   }
   return names;
+}
+
+// Encoders that find no memory while they are opened write so to the standard error, past the
+// library's log and past whoever reads it. So what they take at least, with stacks of some threads,
+// is asked for before. Throws std::bad_alloc.
+void AskForMemory(std::size_t pixels) {
+  constexpr std::size_t kLeast = std::size_t{64} << 20, kAPixel = 16;  // bytes
+  // Volatile, or compilers take an allocation that is freed at once for had.
+  void* volatile asked = std::malloc(kLeast + kAPixel * pixels);
+  if (!asked) throw std::bad_alloc();
+  std::free(asked);
 }
 
 }  // namespace
@@ -176,7 +188,9 @@ bool Encoder::Open(const AVCodec& codec, const AVOutputFormat& format, const Cli
   }
   // It writes to the standard error past the library's log.
   if (c.priv_data) av_opt_set(c.priv_data, "x265-params", "log-level=error", 0);
+  AskForMemory(static_cast<std::size_t>(width_) * static_cast<std::size_t>(height_));
   error = avcodec_open2(&c, &codec, nullptr);
+  if (error == AVERROR(ENOMEM)) throw std::bad_alloc();
   return error >= 0;
 }
 
