@@ -16,7 +16,7 @@ install(TARGETS calmframe DESTINATION "${CMAKE_INSTALL_BINDIR}")
 install(TARGETS calmframe_plugin tessel tesselui DESTINATION "${private_libdir}")
 
 # What the program says of itself.
-set(manual "${CMAKE_BINARY_DIR}/manual")
+set(manual "${PROJECT_BINARY_DIR}/manual")
 add_custom_command(
   OUTPUT "${manual}/calmframe.1.gz" "${manual}/calmframe" "${manual}/_calmframe" "${manual}/calmframe.fish"
   COMMAND "${CMAKE_COMMAND}" -E make_directory "${manual}"
@@ -39,15 +39,15 @@ install(FILES platform/tessel/shutdown.h DESTINATION "${CMAKE_INSTALL_INCLUDEDIR
 file(RELATIVE_PATH prefix_from_pkgconfig "${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig" "${CMAKE_INSTALL_PREFIX}")
 string(REGEX REPLACE "/$" "" prefix_from_pkgconfig "${prefix_from_pkgconfig}")
 configure_file(cmake/package/calmframe.pc.in calmframe.pc @ONLY)
-install(FILES "${CMAKE_BINARY_DIR}/calmframe.pc" DESTINATION "${CMAKE_INSTALL_LIBDIR}/pkgconfig")
+install(FILES "${PROJECT_BINARY_DIR}/calmframe.pc" DESTINATION "${CMAKE_INSTALL_LIBDIR}/pkgconfig")
 
 install(FILES README.md CHANGELOG.md LICENSE cmake/package/copyright DESTINATION "${CMAKE_INSTALL_DOCDIR}")
 install(DIRECTORY docs DESTINATION "${CMAKE_INSTALL_DOCDIR}" FILES_MATCHING PATTERN "*.md" PATTERN "*.png" PATTERN "*.svg")
 install(FILES examples/minimal_host.c DESTINATION "${CMAKE_INSTALL_DOCDIR}/examples")
-execute_process(COMMAND gzip -9nc "${CMAKE_SOURCE_DIR}/cmake/package/changelog" OUTPUT_FILE "${CMAKE_BINARY_DIR}/changelog.gz"
+execute_process(COMMAND gzip -9nc "${PROJECT_SOURCE_DIR}/cmake/package/changelog" OUTPUT_FILE "${PROJECT_BINARY_DIR}/changelog.gz"
   COMMAND_ERROR_IS_FATAL ANY)
 set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS cmake/package/changelog)
-install(FILES "${CMAKE_BINARY_DIR}/changelog.gz" DESTINATION "${CMAKE_INSTALL_DOCDIR}")
+install(FILES "${PROJECT_BINARY_DIR}/changelog.gz" DESTINATION "${CMAKE_INSTALL_DOCDIR}")
 
 set(CPACK_GENERATOR DEB)
 set(CPACK_PACKAGE_VENDOR "Calmframe developers")
@@ -65,5 +65,5 @@ set(CPACK_STRIP_FILES ON)
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION video)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
-set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS "${CMAKE_BINARY_DIR}/platform/tessel" "${CMAKE_BINARY_DIR}/platform/tesselui")
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS "${PROJECT_BINARY_DIR}/platform/tessel" "${PROJECT_BINARY_DIR}/platform/tesselui")
 include(CPack)

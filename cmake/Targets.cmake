@@ -5,7 +5,7 @@ function(calmframe_library name)
   cmake_parse_arguments(ARG "SHARED" "" "SOURCES;LINKS" ${ARGN})
   if(NOT ARG_SOURCES)
     add_library(${name} INTERFACE)
-    target_include_directories(${name} INTERFACE "${CMAKE_SOURCE_DIR}")
+    target_include_directories(${name} INTERFACE "${PROJECT_SOURCE_DIR}")
     target_link_libraries(${name} INTERFACE ${ARG_LINKS})
     return()
   endif()
@@ -14,7 +14,7 @@ function(calmframe_library name)
   else()
     add_library(${name} STATIC ${ARG_SOURCES})
   endif()
-  target_include_directories(${name} PUBLIC "${CMAKE_SOURCE_DIR}")
+  target_include_directories(${name} PUBLIC "${PROJECT_SOURCE_DIR}")
   target_link_libraries(${name} PUBLIC ${ARG_LINKS})
   # A source that is compiled for every instruction set includes itself, so it can't be joined with others.
   foreach(source IN LISTS ARG_SOURCES)
@@ -33,7 +33,7 @@ endfunction()
 function(calmframe_program name)
   cmake_parse_arguments(ARG "" "" "SOURCES;LINKS" ${ARGN})
   add_executable(${name} ${ARG_SOURCES})
-  target_include_directories(${name} PRIVATE "${CMAKE_SOURCE_DIR}")
+  target_include_directories(${name} PRIVATE "${PROJECT_SOURCE_DIR}")
   target_link_libraries(${name} PRIVATE ${ARG_LINKS})
 endfunction()
 
@@ -56,15 +56,15 @@ function(calmframe_test name)
     target_compile_options(${name} PRIVATE ${test_options})
     set_target_properties(${name} PROPERTIES UNITY_BUILD ON)
     target_precompile_headers(${name} REUSE_FROM test_headers)
-    set(list "${CMAKE_BINARY_DIR}/suites/${name}.cmake")
+    set(list "${PROJECT_BINARY_DIR}/suites/${name}.cmake")
     add_custom_command(TARGET ${name} POST_BUILD
       COMMAND "${CMAKE_COMMAND}" -DPROGRAM=$<TARGET_FILE:${name}> -DNAME=${name} -DLABELS=${ARG_LABELS} -DLIST=${list}
-        -P "${CMAKE_SOURCE_DIR}/cmake/ListSuites.cmake"
+        -P "${PROJECT_SOURCE_DIR}/cmake/ListSuites.cmake"
       BYPRODUCTS "${list}" VERBATIM)
     # A program that was not built has no list, and its absence must show.
-    file(WRITE "${CMAKE_BINARY_DIR}/suites/include_${name}.cmake"
+    file(WRITE "${PROJECT_BINARY_DIR}/suites/include_${name}.cmake"
       "if(EXISTS \"${list}\")\n  include(\"${list}\")\nelse()\n  add_test(${name}_NOT_BUILT ${name}_NOT_BUILT)\nendif()\n")
-    set_property(DIRECTORY APPEND PROPERTY TEST_INCLUDE_FILES "${CMAKE_BINARY_DIR}/suites/include_${name}.cmake")
+    set_property(DIRECTORY APPEND PROPERTY TEST_INCLUDE_FILES "${PROJECT_BINARY_DIR}/suites/include_${name}.cmake")
     if("threads" IN_LIST ARG_LABELS)
       add_dependencies(thread_tests ${name})
     endif()
