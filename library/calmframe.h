@@ -142,7 +142,7 @@ typedef struct calmframe_options {
      one clip from that of another, so that projects of this file may be exchanged with the
      program. Null: `identity` does. */
   const char* clip;
-  /* Any text that is the same for the same frames. Null: size, rate and frame count alone. */
+  /* Any text that is the same for the same frames. Null: size and rate alone. */
   const char* identity;
 
   /* The plug-in, calmframe.hxp. Null: where CALMFRAME_PLUGIN of the environment says, else where it
