@@ -83,6 +83,8 @@ class ClipSession {
   // Its frames are drawn from now on.
   void Show(host::SteadyClip& shot, std::size_t number);
   bool IsOnlyShot(const host::SteadyClip& shot) const;
+  // Into the film's saved work, unless it is there.
+  void KeepOpenShot();
   host::Project Kept();
   void DropFilm();
 
@@ -123,6 +125,7 @@ class ClipSession {
   // The worker's own, but that Begin sets the last three.
   std::optional<host::Project> saved_;  // what there is if the film is dropped
   std::unique_ptr<host::Film> film_;
+  bool is_kept_ = false;  // the open shot
   host::ParamValues values_, changes_;
   host::WindowSettings window_;
 

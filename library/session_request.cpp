@@ -84,6 +84,7 @@ SessionRequest::SessionRequest(const calmframe_options& options)
       clip(ClipOf(options)),
       content(ContentOf(options)),
       shots(ShotsOf(options)),
+      shots_by_source(options.shots == CALMFRAME_SHOTS_BY_SOURCE),
       fetch(options.fetch),
       user(options.user),
       plugin(options.plugin ? options.plugin : PluginPlace()) {}

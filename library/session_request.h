@@ -18,6 +18,7 @@ struct SessionRequest {
   media::ClipInfo clip;  // its path: that of the clip, or what stands for it in texts
   tessel::utility::Guid content;
   host::ShotRequest shots;
+  bool shots_by_source;  // nobody said which: saved work has its own
   calmframe_fetch fetch;
   void* user;
   std::string plugin;

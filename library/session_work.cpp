@@ -92,8 +92,13 @@ bool ClipSession::IsOnlyShot(const host::SteadyClip& shot) const {
   return film_->number() == 0 && static_cast<std::int64_t>(shot.range().end) >= feed_.count();
 }
 
+void ClipSession::KeepOpenShot() {
+  if (!is_kept_) film_->Keep();
+  is_kept_ = true;
+}
+
 host::Project ClipSession::Kept() {
-  film_->Keep();
+  KeepOpenShot();
   host::Project project = film_->Saved();
   project.end_frame = static_cast<std::int32_t>(feed_.count());
   return project;
@@ -116,8 +121,10 @@ host::SteadyClip& ClipSession::FirstShot() {
   const host::ClipMedium medium{clip, host::SourcePtr(&feed_, [](host::Source*) {}),
                                 feed_.is_pushed() ? nullptr : std::make_shared<const AllFound>(),
                                 clip.frame_count};
-  film_ = saved_ ? std::make_unique<host::Film>(request_.plugin, medium, *saved_, request_.shots)
-                 : std::make_unique<host::Film>(request_.plugin, medium, request_.shots);
+  host::ShotRequest shots = request_.shots;
+  if (saved_ && request_.shots_by_source) shots.kind = host::ShotRequest::Kind::automatic;
+  film_ = saved_ ? std::make_unique<host::Film>(request_.plugin, medium, *saved_, shots)
+                 : std::make_unique<host::Film>(request_.plugin, medium, shots);
   host::SteadyClip* const shot = film_->Next();
   shot->SetControls(values_);
   return *shot;
@@ -150,6 +157,7 @@ void ClipSession::Show(host::SteadyClip& shot, std::size_t number) {
 
 void ClipSession::WorkShot(host::SteadyClip& shot) {
   Onlooker onlooker(*this);
+  is_kept_ = false;
   ShotResult result;
   result.solved = Steady(shot, onlooker);
   result.first = static_cast<std::int64_t>(shot.range().first);
@@ -172,7 +180,7 @@ void ClipSession::WorkShots() {
     const bool goes_on = feed_.Comes(static_cast<std::int64_t>(shot->range().end));
     if (cancelled_ || closing_) throw host::Interrupted();
     if (!goes_on) return;
-    film_->Keep();
+    KeepOpenShot();
     {
       const std::lock_guard lock(mutex_);
       drawn_ = nullptr;
@@ -184,7 +192,7 @@ void ClipSession::WorkShots() {
 }
 
 void ClipSession::OpenShot(std::size_t number) {
-  if (film_->Saved().shots.size() <= film_->number()) film_->Keep();
+  KeepOpenShot();
   {
     const std::lock_guard lock(mutex_);
     idle_.clear();

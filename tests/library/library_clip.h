@@ -56,24 +56,28 @@ calmframe_image ImageOf(const std::vector<Pixel>& pixels, int width, int height)
   return image;
 }
 
-// A walk down a street: as a file, whose frames are just these, and as pixels.
+// A walk down a street, or one street behind the other: as a file, whose frames are just these, and
+// as pixels.
 struct Street {
   static constexpr int kWidth = 160, kHeight = 120, kFrames = 24;
 
-  Street() {
+  explicit Street(const std::vector<unsigned>& seeds = {7}) {
     media::EncodeSettings lossless;
     lossless.codec = "ffv1";
     lossless.pixel_format = "bgra";
-    const media::ClipInfo info = Made(kWidth, kHeight, kFrames, 25);
+    const media::ClipInfo info = Made(kWidth, kHeight, kFrames * seeds.size(), 25);
     synthetic::scene_options options;
     options.width = kWidth;
     options.height = kHeight;
     options.frame_count = kFrames;
-    const synthetic::scene scene(synthetic::street(7), synthetic::handheld_path({}), options);
+    std::vector<synthetic::scene> scenes;
+    for (const unsigned seed : seeds) {
+      scenes.emplace_back(synthetic::street(seed), synthetic::handheld_path({}), options);
+    }
     WriteClip(
         path, info,
         [&](int frame, HX_Pixel8* pixels) {
-          scene.render(frame, pixels, kWidth);
+          scenes[frame / kFrames].render(frame % kFrames, pixels, kWidth);
           frames.emplace_back(pixels, pixels + std::size_t{kWidth} * kHeight);
         },
         lossless);
@@ -85,7 +89,7 @@ struct Street {
     options.width = kWidth;
     options.height = kHeight;
     options.format = CALMFRAME_ARGB;
-    options.frame_count = kFrames;
+    options.frame_count = static_cast<std::int64_t>(frames.size());
     return options;
   }
   // The same, where the frames are fetched.

@@ -121,6 +121,49 @@ TEST(LibraryWorkTest, EachOfTwoToldShotsIsAsAlone) {
   EXPECT_EQ(equal, 12);
 }
 
+TEST(LibraryWorkTest, ShotsAreFoundWhereFramesAreFetchedAndSavedWithTheWork) {
+  Street film({7, 8});
+  void* bytes;
+  std::size_t size, count;
+  calmframe_shot shot;
+  std::vector<HX_Pixel8> first, last;
+  {
+    const Opened session(film.Fetching());
+    session.Solve();
+    ASSERT_EQ(calmframe_get_shot_count(session, &count), CALMFRAME_OK);
+    ASSERT_EQ(count, 2u);
+    ASSERT_EQ(calmframe_get_shot(session, 1, &shot), CALMFRAME_OK);
+    EXPECT_EQ(shot.first, 24);
+    EXPECT_EQ(shot.end, 48);
+    for (const char* const smoothness : {"50", "20"}) {
+      SCOPED_TRACE(smoothness);
+      const std::string steady = film.folder.In(smoothness) + ".mkv";
+      const std::string flags = std::string(smoothness) == "50" ? "" : " --smoothness 20";
+      ASSERT_EQ(Shell(CALMFRAME_PROGRAM " stabilize '" + film.path + "' '" + steady +
+                      "' --codec ffv1 --quiet" + flags + " 2>&1")
+                    .code,
+                0);
+      if (!flags.empty()) {
+        ASSERT_EQ(calmframe_set(session, "Smoothness", smoothness), CALMFRAME_OK);
+        session.Solve();
+      }
+      const auto reader = media::ClipReader::Open(steady);
+      for (const int f : {0, 23, 24, 47}) {
+        EXPECT_TRUE(SamePixels(film.Steady(session, f, false), ReadFrame(*reader, f))) << f;
+      }
+    }
+    first = film.Steady(session, 0);
+    last = film.Steady(session, 47);
+    ASSERT_EQ(calmframe_save(session, &bytes, &size), CALMFRAME_OK);
+  }
+  const Opened session(film.Options());  // its frames would be pushed
+  ASSERT_EQ(calmframe_load(session, bytes, size), CALMFRAME_OK) << session.Text();
+  calmframe_free(bytes);
+  session.Solve();
+  EXPECT_TRUE(SamePixels(film.Steady(session, 47), last));
+  EXPECT_TRUE(SamePixels(film.Steady(session, 0), first));
+}
+
 TEST(LibraryWorkTest, SavedWorkIsTakenUpByAnotherSessionAndOfTheProgram) {
   Street street;
   void* bytes;
