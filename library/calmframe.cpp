@@ -1,5 +1,7 @@
 #include "library/calmframe.h"
 
+#include <unistd.h>
+
 #include <algorithm>
 #include <cstdio>
 #include <cstdlib>
@@ -12,6 +14,7 @@
 #include <mutex>
 #include <new>
 #include <string>
+#include <utility>
 
 #include "host/project/project_file.h"
 #include "library/clip_session.h"
@@ -105,30 +108,38 @@ class PassingFile {
     if (!mkdtemp(name.data())) {
       throw host::ProjectFailure(name + ": a temporary folder can't be made");
     }
-    folder_ = name;
+    std::string path;
+    try {
+      path = name + "/saved";
+    } catch (...) {
+      rmdir(name.c_str());
+      throw;
+    }
+    folder_ = std::move(name);
+    path_ = std::move(path);
   }
-  ~PassingFile() {
-    std::error_code error;
-    std::filesystem::remove_all(folder_, error);
+  ~PassingFile() {  // takes no memory
+    unlink(path_.c_str());
+    rmdir(folder_.c_str());
   }
   PassingFile(const PassingFile&) = delete;
   PassingFile& operator=(const PassingFile&) = delete;
 
-  std::string path() const { return folder_ / "saved"; }
+  const std::string& path() const { return path_; }
   std::string Read() const {
-    std::ifstream file(path(), std::ios::binary);
+    std::ifstream file(path_, std::ios::binary);
     std::string bytes{std::istreambuf_iterator<char>(file), {}};
     if (!file) throw host::ProjectFailure("the saved work can't be read");
     return bytes;
   }
   void Write(const void* bytes, std::size_t size) const {
-    std::ofstream file(path(), std::ios::binary);
+    std::ofstream file(path_, std::ios::binary);
     file.write(static_cast<const char*>(bytes), static_cast<std::streamsize>(size));
     if (!file.flush()) throw host::ProjectFailure("there is no room for a temporary file");
   }
 
  private:
-  std::filesystem::path folder_;
+  std::string folder_, path_;
 };
 
 }  // namespace

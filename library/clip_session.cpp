@@ -81,7 +81,6 @@ void ClipSession::Begin() {
   if (closing_) Refuse(CALMFRAME_ERROR_CANCELLED, "was closed");
   if (users_ > 0) Refuse(CALMFRAME_ERROR_BUSY, "frames are being drawn");
   values_ = controls_.values();
-  changes_ = controls_.TakeChanges();
   window_ = controls_.window();
   cancelled_ = false;
   feed_.BeginWork();

@@ -122,11 +122,11 @@ class ClipSession {
   int depth_ = 8;
   bool fills_edges_ = false;
 
-  // The worker's own, but that Begin sets the last three.
+  // The worker's own, but that Begin sets the last two.
   std::optional<host::Project> saved_;  // what there is if the film is dropped
   std::unique_ptr<host::Film> film_;
   bool is_kept_ = false;  // the open shot
-  host::ParamValues values_, changes_;
+  host::ParamValues values_;
   host::WindowSettings window_;
 
   Worker worker_;

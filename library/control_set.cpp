@@ -68,7 +68,7 @@ void ControlSet::Set(const std::string& name, const std::string& value) {
   if (SetWindow(name, value)) return;
   const HX_ParamDef* const param = FindParam(name, declared_);
   if (!param) throw Refusal(CALMFRAME_ERROR_ARGUMENT, UnknownParamText(name, declared_));
-  values_[param->disk_id] = changes_[param->disk_id] = ParamValueOf(*param, value);
+  values_[param->disk_id] = ParamValueOf(*param, value);
 }
 
 std::string ControlSet::Json() const {

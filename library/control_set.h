@@ -2,7 +2,6 @@
 
 #include <deque>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "host/effects/param_table.h"
@@ -21,9 +20,8 @@ class ControlSet {
   // See calmframe_set. Throws Refusal and ParamRefused.
   void Set(const std::string& name, const std::string& value);
 
-  // What was set of the effect's, ever and since the last call of TakeChanges.
+  // What was set of the effect's.
   const host::ParamValues& values() const { return values_; }
-  host::ParamValues TakeChanges() { return std::exchange(changes_, {}); }
   const host::WindowSettings& window() const { return window_; }
 
   // See calmframe_get_controls.
@@ -34,7 +32,7 @@ class ControlSet {
 
   std::vector<HX_ParamDef> declared_;
   std::deque<std::string> items_;  // that they point at
-  host::ParamValues values_, changes_;
+  host::ParamValues values_;
   host::WindowSettings window_;
 };
 

@@ -110,7 +110,7 @@ host::SteadyClip& ClipSession::FirstShot() {
     host::SteadyClip* const shot = film_->shot();
     if (shot && IsOnlyShot(*shot)) {
       saved_ = Kept();
-      shot->SetControls(changes_);
+      shot->SetControls(values_);
       return *shot;
     }
   }

@@ -40,13 +40,14 @@ class Worker {
     return result.get();
   }
 
-  // Runs what was posted, then `last`, and joins. The first call counts.
+  // Runs what was posted, then `last`, which may be null, and joins. The first call counts. Takes
+  // no memory.
   void End(std::function<void()> last) {
     {
       const std::lock_guard lock(mutex_);
       if (ended_) return;
       ended_ = true;
-      if (last) tasks_.push_back(std::move(last));
+      last_ = std::move(last);
     }
     changed_.notify_one();
     thread_.join();
@@ -57,19 +58,22 @@ class Worker {
     std::unique_lock lock(mutex_);
     while (true) {
       changed_.wait(lock, [this] { return ended_ || !tasks_.empty(); });
-      if (tasks_.empty()) return;
+      if (tasks_.empty()) break;
       const std::function<void()> task = std::move(tasks_.front());
       tasks_.pop_front();
       lock.unlock();
       task();
       lock.lock();
     }
+    lock.unlock();
+    if (last_) last_();
   }
 
   std::mutex mutex_;
   std::condition_variable changed_;
   std::deque<std::function<void()>> tasks_;  // guarded by mutex_
   bool ended_ = false;                       // guarded by mutex_
+  std::function<void()> last_;               // set before the end
   std::thread thread_;
 };
 
