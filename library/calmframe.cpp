@@ -47,6 +47,12 @@ class Sessions {
     const auto found = sessions_.find(reinterpret_cast<std::uintptr_t>(handle));
     return found == sessions_.end() ? nullptr : found->second;
   }
+  // Any one; null: there is none.
+  SessionPtr TakeOne() {
+    const std::lock_guard lock(mutex_);
+    if (sessions_.empty()) return nullptr;
+    return std::move(sessions_.extract(sessions_.begin()).mapped());
+  }
   SessionPtr Take(calmframe_session handle) {
     const std::lock_guard lock(mutex_);
     auto node = sessions_.extract(reinterpret_cast<std::uintptr_t>(handle));
@@ -61,6 +67,12 @@ class Sessions {
 
 void ExpectPointer(const void* pointer, const char* name) {
   if (!pointer) throw Refusal(CALMFRAME_ERROR_ARGUMENT, std::string(name) + " is null");
+}
+
+// At the process's end, ahead of the plug-in's own: a session that is still open works in it.
+void CloseAll() {
+  if (FrameFeed::IsFetching()) return;
+  while (const SessionPtr session = Sessions::Get().TakeOne()) session->Close();
 }
 
 calmframe_result NoSession() {
@@ -195,6 +207,7 @@ calmframe_result calmframe_open(const calmframe_options* options, calmframe_sess
       throw Refusal(CALMFRAME_ERROR_ARGUMENT, "options were not set by calmframe_options_init");
     }
     *session = Sessions::Get().Add(std::make_shared<ClipSession>(SessionRequest(*options)));
+    std::atexit(CloseAll);  // behind the plug-in that was loaded last, so it runs first
     return CALMFRAME_OK;
   } catch (...) {
     return TellException(thread_line, kLine);

@@ -13,9 +13,11 @@ One session can be open in a process. Failures raise Error, whose `code` is a na
 "CALMFRAME_ERROR_SOLVE"; arrays of a wrong shape or type raise ValueError.
 """
 
+import atexit
 import ctypes
 import json
 import os
+import weakref
 from fractions import Fraction
 from typing import Any, Callable, Dict, List, Optional, Sequence, Tuple, Union
 
@@ -32,6 +34,16 @@ version = _calmframe.version
 #: 1), for a depth of 8, 16 or 32. A planar one is a tuple of three arrays (rows, columns), luma first, of
 #: uint8 or, for depths of 10, 12 and 16, uint16 with the value in the lower bits.
 Frame = Union[np.ndarray, Tuple[np.ndarray, np.ndarray, np.ndarray]]
+
+#: What is open is closed before the interpreter goes, which a fetching thread may be waiting for.
+_open: "weakref.WeakSet[Session]" = weakref.WeakSet()
+
+
+@atexit.register
+def _close_all() -> None:
+    for session in list(_open):
+        session.close()
+
 
 _FORMATS = {"rgba": (0, 4), "bgra": (1, 4), "argb": (2, 4), "rgb": (3, 3), "bgr": (4, 3)}
 _PLANAR = {"yuv420p": (5, 2, 2), "yuv422p": (6, 2, 1), "yuv444p": (7, 1, 1)}
@@ -98,6 +110,7 @@ class Session:
             if text is not None:
                 options[name] = os.fspath(text)
         self._session = _calmframe.Session(options, self._fill if fetch else None)
+        _open.add(self)
 
     def __enter__(self) -> "Session":
         return self

@@ -1,7 +1,7 @@
 #include <gmock/gmock.h>
 
 #include <atomic>
-#include <chrono>
+#include <cstdlib>
 #include <string>
 #include <thread>
 
@@ -199,6 +199,24 @@ TEST(LibraryMisuseTest, ClosedInTheMiddle) {
           << result;
     });
     session.Close();
+  }
+}
+
+TEST(LibraryMisuseDeathTest, LeftOpenAtTheProcessesEnd) {
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  const Street street;
+  const auto leave = [&street](int frames) {
+    const calmframe_options options = street.Options();
+    calmframe_session session;
+    if (calmframe_open(&options, &session) != CALMFRAME_OK) std::exit(1);
+    for (int f = 0; f < frames; ++f) {
+      const calmframe_image image = street.Image(f);
+      if (calmframe_push(session, f, &image) != CALMFRAME_OK) std::exit(2);
+    }
+    std::exit(0);
+  };
+  for (const int frames : {0, 3, 12}) {
+    EXPECT_EXIT(leave(frames), testing::ExitedWithCode(0), "") << frames;
   }
 }
 
