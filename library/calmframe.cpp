@@ -69,7 +69,6 @@ void ExpectPointer(const void* pointer, const char* name) {
   if (!pointer) throw Refusal(CALMFRAME_ERROR_ARGUMENT, std::string(name) + " is null");
 }
 
-// At the process's end, ahead of the plug-in's own: a session that is still open works in it.
 void CloseAll() {
   if (FrameFeed::IsFetching()) return;
   while (const SessionPtr session = Sessions::Get().TakeOne()) session->Close();
@@ -155,6 +154,11 @@ class PassingFile {
 };
 
 }  // namespace
+
+void CloseAtEnd() noexcept {
+  std::atexit(CloseAll);
+}
+
 }  // namespace calmframe::library
 
 using namespace calmframe::library;
@@ -207,7 +211,7 @@ calmframe_result calmframe_open(const calmframe_options* options, calmframe_sess
       throw Refusal(CALMFRAME_ERROR_ARGUMENT, "options were not set by calmframe_options_init");
     }
     *session = Sessions::Get().Add(std::make_shared<ClipSession>(SessionRequest(*options)));
-    std::atexit(CloseAll);  // behind the plug-in that was loaded last, so it runs first
+    CloseAtEnd();
     return CALMFRAME_OK;
   } catch (...) {
     return TellException(thread_line, kLine);

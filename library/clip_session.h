@@ -20,6 +20,10 @@
 
 namespace calmframe::library {
 
+// Has open sessions closed when the process ends, ahead of what was made for the end before: the
+// plug-in's statics come with its work, so this is called for each stage.
+void CloseAtEnd() noexcept;
+
 // See calmframe.h, whose functions these are. Any thread; failures are exceptions that
 // TellException knows. One at a time in a process.
 class ClipSession {

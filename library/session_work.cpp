@@ -36,6 +36,7 @@ class ClipSession::Onlooker final : public host::Watcher {
   void Show(const host::Progress& progress) override {
     const std::lock_guard lock(session_.mutex_);
     calmframe_progress& shown = session_.progress_;
+    if (progress.stage != shown.stage) CloseAtEnd();
     Copy(progress.stage, shown.stage);
     Copy(progress.says, shown.says);
     shown.shot = static_cast<std::int32_t>(session_.shots_.size());

@@ -224,9 +224,11 @@ TEST(LibraryMisuseDeathTest, LeftOpenAtTheProcessesEnd) {
       const calmframe_image image = street.Image(f);
       if (calmframe_push(session, f, &image) != CALMFRAME_OK) std::exit(2);
     }
+    calmframe_progress progress{};  // of work that has begun
+    while (frames > 0 && progress.stage[0] == 0) calmframe_get_progress(session, &progress);
     std::exit(0);
   };
-  for (const int frames : {0, 3, 12}) {
+  for (const int frames : {0, 12}) {
     EXPECT_EXIT(leave(frames), testing::ExitedWithCode(0), "") << frames;
   }
 }
