@@ -2,15 +2,11 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
-#include <cctype>
-#include <cmath>
-#include <cstdlib>
 #include <variant>
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
-#include "apps/calmframe/param_text.h"
-#include "host/base/nearest_match.h"
+#include "host/base/param_text.h"
 #include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
 
@@ -132,62 +128,6 @@ CLI::Option* Add(CLI::App& command, ControlFlags& flags, const Flag& flag, const
       flag.description);
 }
 
-bool SameWord(const std::string& a, const std::string& b) {
-  return std::equal(a.begin(), a.end(), b.begin(), b.end(), [](unsigned char x, unsigned char y) {
-    return std::tolower(x) == std::tolower(y);
-  });
-}
-
-// The one parameter of that name that has a value; null without.
-const HX_ParamDef* FindParam(const std::string& name, const std::vector<HX_ParamDef>& declared) {
-  const auto found = std::find_if(
-      declared.begin(), declared.end(),
-      [&name](const HX_ParamDef& param) { return IsControl(param) && SameWord(param.name, name); });
-  return found == declared.end() ? nullptr : &*found;
-}
-
-std::string UnknownText(const std::string& name, const std::vector<HX_ParamDef>& declared) {
-  std::vector<std::string> names;
-  for (const HX_ParamDef& param : declared) {
-    if (IsControl(param)) names.push_back(param.name);
-  }
-  const std::string nearest = NearestMatch(name, names);
-  return "--param: there is no parameter '" + name + "'" +
-         (nearest.empty() ? "; calmframe params lists them" : "; did you mean '" + nearest + "'?");
-}
-
-double ParseValue(const HX_ParamDef& param, const std::string& text) {
-  char* end = nullptr;
-  const double number = std::strtod(text.c_str(), &end);
-  const bool is_number = !text.empty() && *end == 0 && std::isfinite(number);
-  const auto refuse = [&](const std::string& why) -> double {
-    throw UsageFailure("--param " + std::string(param.name) + ": " + why);
-  };
-  switch (param.kind) {
-    case HX_PARAM_FLOAT_SLIDER: {
-      const double least = WrittenNumber(param.u.fs.valid_min);
-      const double most = WrittenNumber(param.u.fs.valid_max);
-      if (is_number && number >= least && number <= most) return number;
-      return refuse(text + " is out of range: " + NumberText(least) + " to " + NumberText(most));
-    }
-    case HX_PARAM_CHECKBOX:
-      if (SameWord(text, "on") || SameWord(text, "true") || text == "1") return 1;
-      if (SameWord(text, "off") || SameWord(text, "false") || text == "0") return 0;
-      return refuse("'" + text + "' is neither on nor off");
-    default: {
-      const std::vector<std::string> items = PopupItems(param);
-      for (std::size_t i = 0; i < items.size(); ++i) {
-        if (SameWord(items[i], text)) return static_cast<double>(i + 1);
-      }
-      if (is_number && number == std::floor(number) && number >= 1 &&
-          number <= static_cast<double>(items.size())) {
-        return number;
-      }
-      return refuse(NoneOf(text, items));
-    }
-  }
-}
-
 }  // namespace
 
 void AddControlFlags(CLI::App& command, ControlFlags& flags) {
@@ -232,13 +172,18 @@ std::map<std::int32_t, double> ResolveControls(const ControlFlags& flags,
       throw UsageFailure("--param takes NAME=VALUE, not '" + setting + "'");
     }
     if (!param) {
-      throw UsageFailure(UnknownText(setting.substr(0, last), OfferedParams(flags, declared)));
+      throw UsageFailure("--param: " +
+                         UnknownParamText(setting.substr(0, last), OfferedParams(flags, declared)));
     }
     if (!flags.experimental && param - declared.data() >= HX_FIRST_EXPERIMENTAL) {
       throw UsageFailure("--param " + std::string(param->name) +
                          ": is experimental, which takes --experimental");
     }
-    values[param->disk_id] = ParseValue(*param, setting.substr(sign + 1));
+    try {
+      values[param->disk_id] = ParamValueOf(*param, setting.substr(sign + 1));
+    } catch (const ParamRefused& refused) {
+      throw UsageFailure(std::string("--param ") + refused.what());
+    }
   }
   return values;
 }

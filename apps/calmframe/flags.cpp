@@ -4,8 +4,8 @@
 #include <algorithm>
 #include <limits>
 
-#include "apps/calmframe/param_text.h"
 #include "host/base/nearest_match.h"
+#include "host/base/param_text.h"
 
 namespace calmframe {
 
@@ -92,10 +92,6 @@ void TellDefault(CLI::Option& flag, const std::string& value) {
 
 void Exclude(CLI::Option& flag, CLI::Option& other) {
   flag.excludes(&other);
-}
-
-std::string NoneOf(const std::string& text, const std::vector<std::string>& names) {
-  return "'" + text + "' is none of " + CLI::detail::join(names, ", ") + NearestHint(text, names);
 }
 
 }  // namespace calmframe

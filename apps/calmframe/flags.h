@@ -61,7 +61,4 @@ void TellDefault(CLI::Option& flag, const std::string& value);
 // Not both can be given.
 void Exclude(CLI::Option& flag, CLI::Option& other);
 
-// "'perspectiv' is none of position, perspective; did you mean perspective?"
-std::string NoneOf(const std::string& text, const std::vector<std::string>& names);
-
 }  // namespace calmframe

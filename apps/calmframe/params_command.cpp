@@ -8,8 +8,8 @@
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
-#include "apps/calmframe/param_text.h"
 #include "apps/calmframe/plugin_path.h"
+#include "host/base/param_text.h"
 #include "host/effects/host.h"
 #include "host/project/project_file.h"
 

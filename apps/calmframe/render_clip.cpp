@@ -1,10 +1,8 @@
 #include "apps/calmframe/render_clip.h"
 
 #include <algorithm>
-#include <cmath>
 #include <condition_variable>
 #include <cstdint>
-#include <cstring>
 #include <exception>
 #include <map>
 #include <memory>
@@ -15,45 +13,11 @@
 
 #include "apps/calmframe/failures.h"
 #include "host/effects/renderer.h"
-#include "host/stabilize/control_items.h"
+#include "host/stabilize/drawing.h"
 #include "host/timeline/layer.h"
-#include "platform/hx/hx_controls.h"
 
 namespace calmframe {
 namespace {
-
-// The lines of one parity (0: lines 0, 2, 4 ...).
-void CopyField(const host::WorldBuffer& from, int parity, host::WorldBuffer& to) {
-  const auto bytes =
-      static_cast<std::size_t>(host::BytesPerPixel(from.world().format) * from.world().width);
-  for (int y = parity; y < to.world().height; y += 2) {
-    std::memcpy(to.row<std::uint8_t>(y), from.row<std::uint8_t>(y), bytes);
-  }
-}
-
-// The fields of an interlaced frame were shot one after the other, so each is rendered for its own
-// instant and gives its lines.
-DrawnFrame RenderFrame(host::Renderer& renderer, std::int64_t frame, const RenderSettings& settings,
-                       media::FieldOrder order) {
-  const auto render = [&](bool second_field) {
-    host::RenderRequest request;
-    request.frame = frame;
-    request.second_field = second_field;
-    request.bit_depth = settings.depth;
-    request.downsample = {1, static_cast<std::uint32_t>(settings.downsample)};
-    const host::RenderedFrame rendered = renderer.Planned(request);
-    if (!rendered.result.ok()) {
-      throw SolveFailure(rendered.result.Line("frame " + std::to_string(frame)));
-    }
-    return DrawnFrame{rendered.OnLayer(), nullptr, rendered.banner};
-  };
-  DrawnFrame first = render(false);
-  if (order == media::FieldOrder::progressive) return first;
-  const DrawnFrame second = render(true);
-  CopyField(*second.pixels, order == media::FieldOrder::top_first ? 1 : 0, *first.pixels);
-  if (first.banner.empty()) first.banner = second.banner;
-  return first;
-}
 
 // Frames of the range, rendered ahead on threads of its own, each of which has a render side of
 // the effect.
@@ -111,8 +75,9 @@ class RenderAhead {
         lock.unlock();
         // First, since the render asks for the same one.
         const host::PicturePtr shot = settings_.shots ? Shot(frame) : nullptr;
-        DrawnFrame drawn = RenderFrame(*renderer, frame, settings_, clip_.info().field_order);
-        drawn.shot = shot;
+        host::SteadyFrame steady = host::DrawFrame(*renderer, frame, settings_.depth,
+                                                   clip_.info().field_order, settings_.downsample);
+        DrawnFrame drawn{std::move(steady.pixels), shot, std::move(steady.banner)};
         lock.lock();
         done_[frame] = std::move(drawn);
         changed_.notify_all();
@@ -146,36 +111,6 @@ class RenderAhead {
   std::vector<std::thread> threads_;
 };
 
-bool SynthesizesEdges(const SteadyClip& clip) {
-  return clip.ValueOf(HX_FRAMING.disk_id) == host::kSynthesizeEdges;
-}
-
-// The least that holds the source. Layers of soft edges, one on the other, add up the rounding of
-// each: 8 bits leave a dark rim.
-int DepthFor(const SteadyClip& clip) {
-  return clip.info().bit_depth > 8 || SynthesizesEdges(clip) ? 16 : 8;
-}
-
-// Frames on either side that a render looks at.
-double NeighboursOf(const SteadyClip& clip) {
-  const media::Ratio rate = clip.info().frame_rate;
-  return SynthesizesEdges(clip)
-             ? std::round(clip.ValueOf(HX_SYNTHESIS_INPUT_RANGE.disk_id) *
-                          static_cast<double>(rate.num) / static_cast<double>(rate.den))
-             : 0.0;
-}
-
-// Renders in order come back to the frames about them: a cache that holds these spares decoding the
-// clip anew from a key frame for each.
-void MakeRoomForNeighbours(SteadyClip& clip, int depth, int threads) {
-  constexpr double kMost = 2.0 * (1 << 30);
-  const double neighbours = NeighboursOf(clip);
-  if (neighbours == 0) return;
-  const double frame = static_cast<double>(clip.info().width) * clip.info().height * depth / 2;
-  const double frames = 2 * neighbours + threads + 4;
-  clip.host().media().SetCacheBytes(static_cast<std::size_t>(std::min(frames * frame, kMost)));
-}
-
 // Of so many frames, the numbers of those with a banner by what it says.
 std::vector<std::string> BannerLines(const std::map<std::string, std::size_t>& banners,
                                      std::size_t frames) {
@@ -196,17 +131,13 @@ std::vector<std::string> RenderFrames(
     const std::function<void(std::size_t, const DrawnFrame&)>& take,
     const std::function<void()>& finish) {
   RenderSettings own = settings;
-  if (own.depth == 0) own.depth = DepthFor(clip);
+  if (own.depth == 0) own.depth = host::DepthFor(clip);
   if (own.threads == 0) {
     own.threads = static_cast<int>(std::max(1u, std::thread::hardware_concurrency()));
   }
   constexpr int kMostInWork = 8;  // each holds some frames; the strips of one use all processors
   own.threads = std::min(own.threads, kMostInWork);
-  MakeRoomForNeighbours(clip, own.depth, own.threads);
-  host::Effect& drawn = clip.drawn();
-  const std::int32_t hides = drawn.IndexOf(HX_HIDE_WARNING_BANNER.disk_id);
-  const host::CommandResult told = drawn.SetParam(hides, own.warning_banner ? 0 : 1);
-  if (!told.ok()) throw SolveFailure(told.Line(clip.path()));
+  host::PrepareDrawing(clip, own.depth, own.threads, own.warning_banner);
   std::map<std::string, std::size_t> banners;
   RenderAhead frames(clip, range, own);
   Progress shown{stage, 0, static_cast<double>(range.end - range.first), "frames", "", false};

@@ -11,7 +11,6 @@
 
 #include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
-#include "apps/calmframe/param_text.h"
 #include "apps/calmframe/plugin_path.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
@@ -22,6 +21,7 @@
 #include "apps/report/shown_section.h"
 #include "apps/report/solve_figures.h"
 #include "apps/report/solve_section.h"
+#include "host/base/param_text.h"
 #include "host/effects/param_table.h"
 #include "host/media/output_file.h"
 #include "host/timeline/layer.h"

@@ -43,4 +43,10 @@ std::string NearestHint(const std::string& name, const std::vector<std::string>&
   return nearest.empty() ? "" : "; did you mean " + nearest + "?";
 }
 
+std::string NoneOf(const std::string& text, const std::vector<std::string>& names) {
+  std::string list;
+  for (const std::string& name : names) list += (list.empty() ? "" : ", ") + name;
+  return "'" + text + "' is none of " + list + NearestHint(text, names);
+}
+
 }  // namespace calmframe

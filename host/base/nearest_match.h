@@ -13,4 +13,7 @@ std::string NearestMatch(const std::string& name, const std::vector<std::string>
 // text where nothing is near.
 std::string NearestHint(const std::string& name, const std::vector<std::string>& candidates);
 
+// "'perspectiv' is none of position, perspective; did you mean perspective?"
+std::string NoneOf(const std::string& text, const std::vector<std::string>& names);
+
 }  // namespace calmframe

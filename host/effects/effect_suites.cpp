@@ -1,7 +1,5 @@
 #include <algorithm>
 #include <cstring>
-#include <map>
-#include <utility>
 #include <vector>
 
 #include "host/effects/interface_guard.h"
@@ -282,22 +280,29 @@ constexpr HX_OpaqueEffectDataSuite1 kOpaqueEffectData = {FindOpaque, SetOpaque, 
 }  // namespace
 
 const void* FindEffectSuite(std::string_view name, std::int32_t version) {
-  static const std::map<std::pair<std::string_view, std::int32_t>, const void*> suites = {
-      {{HX_PARAM_UTILS_SUITE, HX_PARAM_UTILS_SUITE_VERSION}, &kParamUtils},
-      {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_3}, &kUtility},
-      {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_4}, &kUtility},
-      {{HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_5}, &kUtility},
-      {{HX_PRIVATE_EFFECT_SUITE, HX_PRIVATE_EFFECT_SUITE_VERSION}, &kPrivateEffect},
-      {{HX_APP_SUITE, HX_APP_SUITE_VERSION}, &kApp},
-      {{HX_ADV_APP_SUITE, HX_ADV_APP_SUITE_VERSION}, &kAdvApp},
-      {{HX_WORLD_SUITE, HX_WORLD_SUITE_VERSION}, &kWorld},
-      {{HX_BLUR_SUITE, HX_BLUR_SUITE_VERSION}, &kBlur},
-      {{HX_ANALYSIS_HOST_SUITE, HX_ANALYSIS_HOST_SUITE_VERSION}, &kAnalysisHost},
-      {{HX_ANALYSIS_SPAN_SUITE, HX_ANALYSIS_SPAN_SUITE_VERSION}, &kAnalysisSpan},
-      {{HX_STABILIZER_HOST_SUITE, HX_STABILIZER_HOST_SUITE_VERSION}, &kStabilizerHost},
-      {{HX_OPAQUE_EFFECT_DATA_SUITE, HX_OPAQUE_EFFECT_DATA_SUITE_VERSION}, &kOpaqueEffectData}};
-  const auto found = suites.find({name, version});
-  return found == suites.end() ? nullptr : found->second;
+  // A plain table: a map would be gone under an effect that is at work when the process ends.
+  static constexpr struct {
+    const char* name;
+    std::int32_t version;
+    const void* table;
+  } kSuites[] = {
+      {HX_PARAM_UTILS_SUITE, HX_PARAM_UTILS_SUITE_VERSION, &kParamUtils},
+      {HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_3, &kUtility},
+      {HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_4, &kUtility},
+      {HX_UTILITY_SUITE, HX_UTILITY_SUITE_VERSION_5, &kUtility},
+      {HX_PRIVATE_EFFECT_SUITE, HX_PRIVATE_EFFECT_SUITE_VERSION, &kPrivateEffect},
+      {HX_APP_SUITE, HX_APP_SUITE_VERSION, &kApp},
+      {HX_ADV_APP_SUITE, HX_ADV_APP_SUITE_VERSION, &kAdvApp},
+      {HX_WORLD_SUITE, HX_WORLD_SUITE_VERSION, &kWorld},
+      {HX_BLUR_SUITE, HX_BLUR_SUITE_VERSION, &kBlur},
+      {HX_ANALYSIS_HOST_SUITE, HX_ANALYSIS_HOST_SUITE_VERSION, &kAnalysisHost},
+      {HX_ANALYSIS_SPAN_SUITE, HX_ANALYSIS_SPAN_SUITE_VERSION, &kAnalysisSpan},
+      {HX_STABILIZER_HOST_SUITE, HX_STABILIZER_HOST_SUITE_VERSION, &kStabilizerHost},
+      {HX_OPAQUE_EFFECT_DATA_SUITE, HX_OPAQUE_EFFECT_DATA_SUITE_VERSION, &kOpaqueEffectData}};
+  for (const auto& suite : kSuites) {
+    if (name == suite.name && version == suite.version) return suite.table;
+  }
+  return nullptr;
 }
 
 }  // namespace calmframe::host

@@ -139,6 +139,9 @@ Film::Film(const std::string& plugin, const ClipMedium& medium, const media::Cli
     : Film(plugin, medium, part ? part(medium.info) : media::FrameRange{0, medium.info.frame_count},
            nullptr, request) {}
 
+Film::Film(const std::string& plugin, const ClipMedium& medium, const ShotRequest& request)
+    : Film(plugin, medium, media::ClipReader::Part(), request) {}
+
 Film::Film(const std::string& plugin, const ClipMedium& medium, const Project& project,
            const ShotRequest& request)
     : Film(plugin, medium, RangeOf(project, medium.info), &project, request) {}

@@ -60,6 +60,10 @@ class Film {
        const ShotRequest& request = {});
   // Of a clip that is gone: what was made of it stands, its frames are blank.
   Film(const std::string& plugin, const Project& project);
+  // The same of a clip that is open, whoever has its frames: all of it, or the saved work's part.
+  Film(const std::string& plugin, const ClipMedium& medium, const ShotRequest& request);
+  Film(const std::string& plugin, const ClipMedium& medium, const Project& project,
+       const ShotRequest& request);
 
   const media::ClipInfo& whole() const { return medium_.info; }
   // The clip's frames that are worked, and what they are as a clip of their own.
@@ -71,6 +75,8 @@ class Film {
   SteadyClip* Next();
   // Closes the shot that is open and opens this one of Saved(); Next goes on from there.
   SteadyClip* Open(std::size_t number);
+  // The shot that is open; null: none is.
+  SteadyClip* shot() const { return shot_.get(); }
   // Of the shot that is open, counted from 0.
   std::size_t number() const { return number_; }
   // Of the shot that is open: whether it is all of the film, as far as is known by now.
@@ -83,8 +89,6 @@ class Film {
 
  private:
   Film(const std::string& plugin, const ClipMedium& medium, const media::ClipReader::Part& part,
-       const ShotRequest& request);
-  Film(const std::string& plugin, const ClipMedium& medium, const Project& project,
        const ShotRequest& request);
   Film(const std::string& plugin, const ClipMedium& medium, const media::FrameRange& range,
        const Project* project, const ShotRequest& request);

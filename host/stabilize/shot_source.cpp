@@ -60,7 +60,7 @@ std::int64_t ShotSource::EndOfShot(std::int64_t frame) const {
   std::lock_guard lock(mutex_);
   const auto next = std::find_if(borders_.begin(), borders_.end(),
                                  [frame](const ShotBorder& b) { return b.frame > frame; });
-  return next == borders_.end() ? kNoEnd : next->frame;
+  return std::min(next == borders_.end() ? kNoEnd : next->frame, source_->EndOfShot(frame));
 }
 
 std::vector<ShotBorder> ShotSource::borders() const {

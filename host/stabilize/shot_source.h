@@ -13,7 +13,7 @@
 namespace calmframe::host {
 
 // A clip's frames, with where its shots end: as somebody tells it, or as it is found in the frames
-// while an analysis fetches them. Any thread.
+// while an analysis fetches them; or where the source itself ends one. Any thread.
 class ShotSource final : public Source {
  public:
   // `range`: the frames that are worked. With `borders` the first frames of shots, ascending,

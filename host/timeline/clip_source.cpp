@@ -73,13 +73,7 @@ class ClipSource final : public Source {
   explicit ClipSource(std::unique_ptr<media::ClipReader> reader) : pool_(PicturePool::Make()) {
     cursors_.push_back({std::move(reader)});
     const media::ClipInfo& clip = cursors_[0].reader->info();
-    info_.width = clip.width;
-    info_.height = clip.height;
-    info_.pixel_aspect = AspectOf(clip.pixel_aspect);
-    info_.frame_count = static_cast<std::int64_t>(clip.frame_count);
-    info_.ticks_per_frame = TicksPerFrame(clip.frame_rate);
-    info_.field_type = FieldTypeOf(clip.field_order);
-    info_.bit_depth = clip.bit_depth;
+    info_ = SourceInfoOf(clip);
     info_.content = ContentOf(clip.path);
   }
 
@@ -181,6 +175,18 @@ Guid ContentOfFile(const std::string& path) {
 }
 
 }  // namespace
+
+SourceInfo SourceInfoOf(const media::ClipInfo& clip) {
+  SourceInfo info;
+  info.width = clip.width;
+  info.height = clip.height;
+  info.pixel_aspect = AspectOf(clip.pixel_aspect);
+  info.frame_count = static_cast<std::int64_t>(clip.frame_count);
+  info.ticks_per_frame = TicksPerFrame(clip.frame_rate);
+  info.field_type = FieldTypeOf(clip.field_order);
+  info.bit_depth = clip.bit_depth;
+  return info;
+}
 
 Guid ContentOf(const std::string& path) {
   const media::ClipFiles files = media::FilesOf(path);

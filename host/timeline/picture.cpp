@@ -79,7 +79,9 @@ PixelKind KindOfDepth(int bits) {
 }
 
 boost::shared_ptr<PicturePool> PicturePool::Make() {
-  return boost::make_shared<PicturePool>();
+  const auto pool = boost::make_shared<PicturePool>();
+  pool->spare_.reserve(kSpareBlocks);  // a picture that goes takes no memory
+  return pool;
 }
 
 boost::shared_ptr<Picture> PicturePool::NewPicture(PixelKind kind, int width, int height,

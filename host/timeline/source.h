@@ -47,6 +47,9 @@ class Source {
 
 using SourcePtr = boost::shared_ptr<Source>;
 
+// What a clip's info tells of its frames; the content is the caller's.
+SourceInfo SourceInfoOf(const media::ClipInfo& clip);
+
 // Identity of a clip's contents, from the sizes, the first and the last bytes of its files: equal
 // for copies under any name. Throws media::Failure if it can't be read.
 tessel::utility::Guid ContentOf(const std::string& path);

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -27,7 +28,21 @@ double DefaultOf(const HX_ParamDef& param);
 // Whether the value, of a project or of the user, differs from it by more than single precision.
 bool IsChanged(const HX_ParamDef& param, double value);
 
-// A value as --param takes it.
+// A value as ParamValueOf takes it.
 std::string ValueText(const HX_ParamDef& param, double value);
+
+// A value that a parameter doesn't take; one line that begins with its name.
+class ParamRefused : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+// What a text sets a parameter to: a number within its range, the name or number of an item, or
+// on, true, 1, off, false, 0. Case doesn't count. Throws ParamRefused.
+double ParamValueOf(const HX_ParamDef& param, const std::string& text);
+
+// The control of that name, case apart; null without.
+const HX_ParamDef* FindParam(const std::string& name, const std::vector<HX_ParamDef>& declared);
+// "there is no parameter 'smothness'; did you mean 'Smoothness'?"
+std::string UnknownParamText(const std::string& name, const std::vector<HX_ParamDef>& declared);
 
 }  // namespace calmframe
