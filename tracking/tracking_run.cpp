@@ -25,6 +25,16 @@ std::size_t FillSlots(const std::vector<FeatureSelector::Feature>& selected,
   return next;
 }
 
+// Room for the first rows, then for four times as many: a run over the rest of a film may end with
+// its shot, and all of a table would be as long as that rest for each.
+void Grow(std::vector<tracking_feature<float>>& cells, std::size_t rows, std::size_t feature_count,
+          std::size_t frame_count) {
+  constexpr std::size_t kFirstRows = 1024;
+  const std::size_t grown = std::min(frame_count, std::max(kFirstRows, 4 * rows)) * feature_count;
+  cells.reserve(grown);  // resize alone would take twice as much
+  cells.resize(grown);
+}
+
 }  // namespace
 
 void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
@@ -34,7 +44,8 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
   const auto feature_count = static_cast<std::size_t>(selector_params.max_count);
   all_features.feature_count = static_cast<std::int32_t>(feature_count);
   all_features.frame_count = static_cast<std::int32_t>(frame_count);
-  all_features.features->assign(feature_count * frame_count, {});
+  auto& cells = *all_features.features;
+  cells.clear();
   if (statistics != nullptr) statistics->clear();
   if (frame_count == 0) return;
 
@@ -47,7 +58,8 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
   std::vector<float> scratch;
 
   for (std::size_t t = 0; t < frame_count; ++t) {
-    tracking_feature<float>* row = all_features.features->data() + t * feature_count;
+    if (t * feature_count == cells.size()) Grow(cells, t, feature_count, frame_count);
+    tracking_feature<float>* row = cells.data() + t * feature_count;
     TrackingStatistics frame{0, std::vector<std::size_t>(levels + 1),
                              std::vector<std::size_t>(levels + 1)};
     const auto load_candidates = [&] {
