@@ -59,7 +59,7 @@ AllFeatures ApplyDeletedTrackPoints(const AllFeatures& table, const TrackPoints&
     const std::int32_t marked = Marked(status, flag != 0);
     if (marked == status) return;
     if (result.features == table.features) {
-      result.features = boost::make_shared<std::vector<tracking_feature<float>>>(*table.features);
+      result.features = boost::make_shared<TrackCells>(*table.features);
     }
     (*result.features)[index].status = marked;
   });

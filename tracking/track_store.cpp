@@ -4,7 +4,7 @@
 
 namespace marrow::tracking {
 
-AllFeatures::AllFeatures() : features(boost::make_shared<std::vector<tracking_feature<float>>>()) {}
+AllFeatures::AllFeatures() : features(boost::make_shared<TrackCells>()) {}
 
 void RemoveShortTracks(AllFeatures& all_features, std::int32_t kill_tracks_shorter_than) {
   if (kill_tracks_shorter_than == 0) return;
@@ -26,7 +26,7 @@ void ShortenTable(AllFeatures& all_features, std::int64_t rows,
                   std::int32_t kill_tracks_shorter_than) {
   if (rows >= all_features.frame_count) return;
   const auto& cells = *all_features.features;
-  all_features.features = boost::make_shared<std::vector<tracking_feature<float>>>(
+  all_features.features = boost::make_shared<TrackCells>(
       cells.begin(), cells.begin() + rows * all_features.feature_count);
   all_features.frame_count = static_cast<std::int32_t>(rows);
   RemoveShortTracks(all_features, kill_tracks_shorter_than);

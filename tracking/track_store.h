@@ -3,6 +3,9 @@
 #include <boost/shared_ptr.hpp>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
+#include <new>
+#include <utility>
 #include <vector>
 
 // The table of everything the analysis learned from the pixels: one row for each analysed frame,
@@ -33,12 +36,36 @@ inline constexpr std::int32_t kDeletedSeed = -10;  // by the user
 inline constexpr std::int32_t kDeletedTracked = -11;
 }  // namespace feature_status
 
+// Leaves values as their memory is where nothing is told of them. Of much memory the system gives
+// pages only as they are written, so that a table of which a run fills the first rows alone costs
+// no more than these.
+template <class Value>
+struct UnfilledAllocator : std::allocator<Value> {
+  template <class Other>
+  struct rebind {
+    using other = UnfilledAllocator<Other>;
+  };
+
+  UnfilledAllocator() = default;
+  template <class Other>
+  UnfilledAllocator(const UnfilledAllocator<Other>&) noexcept {}
+
+  void construct(Value* value) noexcept { ::new (static_cast<void*>(value)) Value; }
+  template <class... Arguments>
+  void construct(Value* value, Arguments&&... arguments) {
+    std::construct_at(value, std::forward<Arguments>(arguments)...);
+  }
+};
+
+// The cells of a table. Those of rows that a run has not come to hold anything.
+using TrackCells = std::vector<tracking_feature<float>, UnfilledAllocator<tracking_feature<float>>>;
+
 // The table: a small header that may be copied, over cells that all copies share.
 struct AllFeatures {
   std::int32_t feature_count = 0;
   std::int32_t first_frame = 0;  // absolute index of row 0
   std::int32_t frame_count = 0;
-  boost::shared_ptr<std::vector<tracking_feature<float>>> features;
+  boost::shared_ptr<TrackCells> features;
 
   AllFeatures();  // the empty table, with an empty vector of its own
 };

@@ -34,7 +34,7 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
   const auto feature_count = static_cast<std::size_t>(selector_params.max_count);
   all_features.feature_count = static_cast<std::int32_t>(feature_count);
   all_features.frame_count = static_cast<std::int32_t>(frame_count);
-  all_features.features->assign(feature_count * frame_count, {});
+  *all_features.features = TrackCells(feature_count * frame_count);
   if (statistics != nullptr) statistics->clear();
   if (frame_count == 0) return;
 
@@ -48,6 +48,7 @@ void TrackFrames(FrameSource& source, const SelectorParams& selector_params,
 
   for (std::size_t t = 0; t < frame_count; ++t) {
     tracking_feature<float>* row = all_features.features->data() + t * feature_count;
+    std::fill_n(row, feature_count, tracking_feature<float>{});
     TrackingStatistics frame{0, std::vector<std::size_t>(levels + 1),
                              std::vector<std::size_t>(levels + 1)};
     const auto load_candidates = [&] {

@@ -68,7 +68,7 @@ void WriteAnalysisServerTrackFile(const marrow::tracking::AllFeatures& table) {
   std::error_code error;
   const std::filesystem::path folder = std::filesystem::temp_directory_path(error);
   if (error) return;
-  const std::vector<Cell>& cells = *table.features;
+  const marrow::tracking::TrackCells& cells = *table.features;
   const std::size_t begin =
       std::min(cells.size(), static_cast<std::size_t>(table.first_frame) *
                                  static_cast<std::size_t>(table.feature_count));

@@ -30,7 +30,7 @@ class AnalysisUIDataTest : public ::testing::Test {
   struct Picture : WorldBuffer {
     Picture(int width, int height) : WorldBuffer(width, height, HX_FORMAT_ARGBF) {}
   };
-  using Cells = std::vector<marrow::tracking::tracking_feature<float>>;
+  using Cells = marrow::tracking::TrackCells;
   using Look = std::function<void(StabilizerEffect& effect, HX_InData& in)>;
 
   void SetUp() override {

@@ -49,7 +49,7 @@ TEST_F(AnalysisTest, TracksTheJobsFramesWhicheverWayUpTheyCome) {
   EXPECT_EQ(table.frame_count, 6);
   EXPECT_EQ(table.feature_count, 8);
   // Tracks there are, and they move with the picture.
-  const std::vector<Cell>& cells = *table.features;
+  const marrow::tracking::TrackCells& cells = *table.features;
   int carried = 0;
   for (int s = 0; s < 8; ++s) {
     bool whole = true;

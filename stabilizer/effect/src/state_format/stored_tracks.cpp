@@ -48,7 +48,7 @@ void ForEachPiece(std::size_t cells, const Visit& visit) {
 
 void WriteTrackTable(tessel::filesupport::OutputByteStream& out,
                      const marrow::tracking::AllFeatures& table) {
-  const std::vector<Cell>& cells = *table.features;
+  const marrow::tracking::TrackCells& cells = *table.features;
   if (cells.size() !=
       static_cast<std::size_t>(table.feature_count) * static_cast<std::size_t>(table.frame_count)) {
     throw std::logic_error("track table of another size than its counts tell");
@@ -74,7 +74,7 @@ void ReadTrackTable(tessel::filesupport::InputByteStream& in, bool fixed_point,
   const auto slots = static_cast<std::uint64_t>(table.feature_count);
   const auto rows = static_cast<std::uint64_t>(table.frame_count);
   ExpectRoomFor(in, slots * rows, kCellBytes);
-  std::vector<Cell>& cells = *table.features;
+  marrow::tracking::TrackCells& cells = *table.features;
   // A zip stream's bound lies far above what most hold, so cells come into being as they are read.
   ForEachPiece(slots * rows, [&](std::size_t first, std::size_t count) {
     cells.resize(first + count);
