@@ -78,14 +78,7 @@ std::string ControlSet::Json() const {
     if (!IsControl(param)) continue;
     nlohmann::ordered_json json;
     json["name"] = param.name;
-    json["kind"] = KindText(param);
-    if (param.kind == HX_PARAM_FLOAT_SLIDER) {
-      json["min"] = WrittenNumber(param.u.fs.valid_min);
-      json["max"] = WrittenNumber(param.u.fs.valid_max);
-    } else if (param.kind == HX_PARAM_POPUP) {
-      json["items"] = PopupItems(param);
-    }
-    json["default"] = DefaultOf(param);
+    json.update(DeclarationJson(param));
     json["experimental"] = index >= static_cast<std::size_t>(HX_FIRST_EXPERIMENTAL);
     const auto value = values_.find(param.disk_id);
     json["value"] = nullptr;

@@ -31,14 +31,7 @@ nlohmann::ordered_json JsonOf(const HX_ParamDef& param, double value) {
   nlohmann::ordered_json json;
   json["id"] = param.disk_id;
   json["name"] = param.name;
-  json["kind"] = KindText(param);
-  if (param.kind == HX_PARAM_FLOAT_SLIDER) {
-    json["min"] = WrittenNumber(param.u.fs.valid_min);
-    json["max"] = WrittenNumber(param.u.fs.valid_max);
-  } else if (param.kind == HX_PARAM_POPUP) {
-    json["items"] = PopupItems(param);
-  }
-  json["default"] = DefaultOf(param);
+  json.update(DeclarationJson(param));
   json["value"] = value;
   return json;
 }

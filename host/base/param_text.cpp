@@ -6,6 +6,7 @@
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
+#include <nlohmann/json.hpp>
 #include <sstream>
 
 #include "host/base/nearest_match.h"
@@ -70,6 +71,19 @@ double DefaultOf(const HX_ParamDef& param) {
 
 bool IsChanged(const HX_ParamDef& param, double value) {
   return static_cast<float>(value) != static_cast<float>(DefaultOf(param));
+}
+
+nlohmann::ordered_json DeclarationJson(const HX_ParamDef& param) {
+  nlohmann::ordered_json json;
+  json["kind"] = KindText(param);
+  if (param.kind == HX_PARAM_FLOAT_SLIDER) {
+    json["min"] = WrittenNumber(param.u.fs.valid_min);
+    json["max"] = WrittenNumber(param.u.fs.valid_max);
+  } else if (param.kind == HX_PARAM_POPUP) {
+    json["items"] = PopupItems(param);
+  }
+  json["default"] = DefaultOf(param);
+  return json;
 }
 
 std::string ValueText(const HX_ParamDef& param, double value) {

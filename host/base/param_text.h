@@ -1,5 +1,6 @@
 #pragma once
 
+#include <nlohmann/json_fwd.hpp>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -27,6 +28,10 @@ double WrittenNumber(float number);
 double DefaultOf(const HX_ParamDef& param);
 // Whether the value, of a project or of the user, differs from it by more than single precision.
 bool IsChanged(const HX_ParamDef& param, double value);
+
+// What a control is, for programs: "kind", "min" and "max" of a slider or "items" of a popup, and
+// "default".
+nlohmann::ordered_json DeclarationJson(const HX_ParamDef& param);
 
 // A value as ParamValueOf takes it.
 std::string ValueText(const HX_ParamDef& param, double value);
