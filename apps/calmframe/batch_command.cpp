@@ -200,7 +200,7 @@ void BatchCommand::Run() {
   }
 }
 
-std::vector<std::string> BatchCommand::SettingsFor(const std::string& command) const {
+std::vector<std::string> BatchCommand::SettingsTakenBy(const std::string& command) const {
   const CLI::App& taker = *program_.get_subcommand(command);
   std::vector<std::string> words = Settings();
   std::erase_if(words, [&](const std::string& word) {
@@ -240,9 +240,9 @@ void BatchCommand::RunInPieces(const batch::Plan& plan, BatchResults& results) c
     return words;
   };
   // Each shot is one that is told.
-  const batch::SplitSettings settings{.looking = SettingsFor("batch-shots"),
-                                      .analysis = without(SettingsFor("analyze"), "--shots"),
-                                      .drawing = SettingsFor("render"),
+  const batch::SplitSettings settings{.looking = SettingsTakenBy("batch-shots"),
+                                      .analysis = without(SettingsTakenBy("analyze"), "--shots"),
+                                      .drawing = SettingsTakenBy("render"),
                                       .frames_a_piece = frames_a_piece_};
   std::vector<double> shares(plan.tasks.size());
   for (std::size_t film = 0; film < plan.tasks.size() && !results.Stops(); ++film) {
@@ -272,9 +272,7 @@ void BatchShotsCommand::Run() {
 }
 
 void BatchShotsCommand::Find(host::Opening opening, ProgressLine& progress) const {
-  const host::ClipMedium medium =
-      host::MediumOf(opening == host::Opening::promised ? media::ClipReader::OpenPromised(input_)
-                                                        : media::ClipReader::Open(input_));
+  const host::ClipMedium medium = host::OpenMedium(input_, opening);
   if (!medium.info.warning.empty()) progress.Warn(medium.info.warning);
   const std::vector<std::size_t> begins = host::ShotStarts(medium, shots_, progress);
   auto shots = nlohmann::ordered_json::array();

@@ -29,7 +29,7 @@ class BatchCommand final : public Command {
   void RunAll(const batch::Plan& plan, batch::BatchWatcher& watcher) const;
   batch::SlurmSettings Cluster() const;
   // Those of Settings() that a command takes.
-  std::vector<std::string> SettingsFor(const std::string& command) const;
+  std::vector<std::string> SettingsTakenBy(const std::string& command) const;
 
   std::vector<std::string> inputs_;
   std::string folder_, name_ = "{stem}-steady{ext}";

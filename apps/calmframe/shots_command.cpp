@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "apps/calmframe/flags.h"
+#include "apps/calmframe/project_work.h"
 #include "host/shots/shot_list.h"
 #include "host/stabilize/film.h"
 
@@ -61,7 +62,11 @@ ShotsCommand::ShotsCommand(CLI::App& program)
 void ShotsCommand::Run() {
   ProgressLine progress(run_.progress_form());
   CheckOrder(stretch_);
-  const host::ClipMedium medium = host::MediumOf(media::ClipReader::Open(input_));
+  RunOnPromises([&](host::Opening opening) { List(opening, progress); });
+}
+
+void ShotsCommand::List(host::Opening opening, ProgressLine& progress) const {
+  const host::ClipMedium medium = host::OpenMedium(input_, opening, PartFor(stretch_));
   const media::ClipInfo& clip = medium.info;
   if (!clip.warning.empty()) progress.Warn(clip.warning);
   const media::FrameRange range = FramesOf(stretch_, clip);

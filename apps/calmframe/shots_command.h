@@ -15,6 +15,8 @@ class ShotsCommand final : public Command {
   void Run() override;
 
  private:
+  void List(host::Opening opening, ProgressLine& progress) const;
+
   std::string input_, form_ = "text";
   Stretch stretch_;
   RunFlags run_;

@@ -84,12 +84,16 @@ std::vector<ShotBorder> FindShots(const ClipMedium& medium, const media::FrameRa
     watcher.Show(shown);
     try {
       source.Fetch(static_cast<std::int64_t>(frame), PixelKind::argb8);
-    } catch (const media::Failure&) {
-      throw;
     } catch (const std::runtime_error& error) {
+      if (medium.found && medium.found->standing() == media::Standing::broken) {
+        throw BrokenPromise();
+      }
+      if (dynamic_cast<const media::Failure*>(&error)) throw;
       throw media::Failure(media::Failure::Side::input, error.what());
     }
   }
+  // Decoding may have come upon more frames than were promised.
+  if (medium.found && medium.found->standing() != media::Standing::decoded) throw BrokenPromise();
   shown.done = shown.total;
   shown.ends = true;
   watcher.Show(shown);
@@ -104,27 +108,15 @@ std::vector<std::size_t> ShotStarts(const ClipMedium& medium, const ShotRequest&
     starts.insert(starts.end(), asked->begin(), asked->end());
     return starts;
   }
-  const auto is = [&](media::Standing standing) {
-    return medium.found && medium.found->standing() == standing;
-  };
-  try {
-    for (const ShotBorder& border : FindShots(medium, all, watcher)) {
-      starts.push_back(static_cast<std::size_t>(border.frame));
-    }
-  } catch (const media::Failure&) {
-    if (is(media::Standing::broken)) throw BrokenPromise();
-    throw;
+  for (const ShotBorder& border : FindShots(medium, all, watcher)) {
+    starts.push_back(static_cast<std::size_t>(border.frame));
   }
-  if (!is(media::Standing::decoded)) throw BrokenPromise();
   return starts;
 }
 
 Film::Film(const std::string& plugin, const std::string& path, Opening opening,
            const media::ClipReader::Part& part, const ShotRequest& request)
-    : Film(plugin,
-           MediumOf(opening == Opening::promised ? media::ClipReader::OpenPromised(path, part)
-                                                 : media::ClipReader::Open(path)),
-           part, request) {}
+    : Film(plugin, OpenMedium(path, opening, part), part, request) {}
 
 Film::Film(const std::string& plugin, const Project& project, const std::string& path,
            const ShotRequest& request)

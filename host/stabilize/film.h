@@ -28,13 +28,13 @@ struct ShotRequest {
 };
 
 // Where shots begin in these frames of a clip, found by decoding them, with nothing analysed. Shows
-// the stage "looking". Throws Interrupted, media::Failure.
+// the stage "looking". Throws Interrupted, media::Failure, and BrokenPromise of a clip that was
+// opened by promises.
 std::vector<ShotBorder> FindShots(const ClipMedium& medium, const media::FrameRange& range,
                                   Watcher& watcher);
 
 // The first frames of a clip's shots, the clip's own first; found like that where the request
-// leaves it to that. Throws as FindShots, what the request's list throws, and BrokenPromise of a
-// clip that was opened by promises.
+// leaves it to that. Throws as FindShots, and what the request's list throws.
 std::vector<std::size_t> ShotStarts(const ClipMedium& medium, const ShotRequest& request,
                                     Watcher& watcher);
 

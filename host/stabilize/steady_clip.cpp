@@ -133,6 +133,12 @@ ClipMedium MediumOf(std::unique_ptr<media::ClipReader> reader) {
   return {info, OpenClip(std::move(reader)), frames, info.frame_count};
 }
 
+ClipMedium OpenMedium(const std::string& path, Opening opening,
+                      const media::ClipReader::Part& part) {
+  return MediumOf(opening == Opening::promised ? media::ClipReader::OpenPromised(path, part)
+                                               : media::ClipReader::Open(path));
+}
+
 ClipMedium StandInFor(const Project& project) {
   SourceInfo source;
   source.width = std::max(project.width, 1);

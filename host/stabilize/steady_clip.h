@@ -57,6 +57,9 @@ struct ClipMedium {
 
 // Throws media::Failure where the frames are too small to be stabilized.
 ClipMedium MediumOf(std::unique_ptr<media::ClipReader> reader);
+// Of the clip at a path, or these frames of it. Throws as MediumOf, and what `part` throws.
+ClipMedium OpenMedium(const std::string& path, Opening opening,
+                      const media::ClipReader::Part& part = {});
 // What stands for the clip of saved work that is gone: blank frames.
 ClipMedium StandInFor(const Project& project);
 
