@@ -64,19 +64,19 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
   const std::unique_ptr<host::Film> film = TakeUp(input_, project_, opening, stretch_, shots_);
   const media::ClipInfo info = film->info();
   if (!info.warning.empty()) progress.Warn(info.warning);
-  Unsaved unsaved;
+  WorkFile file(project_);
   std::vector<Analysed> shots;
   while (host::SteadyClip* const shot = NextShot(*film, controls_)) {
     progress.OfShot(film->number() > 0 ? film->number() + 1 : 0);
     bool follows = true;
     if (chooses_) {
       const bool is_all = film->is_one_shot() && film->range().size() == film->whole().frame_count;
-      if (!WorkOrLeaveAsFilmed(*film, *shot, is_all, project_, window_, unsaved, progress)) {
+      if (!WorkOrLeaveAsFilmed(*film, *shot, is_all, file, window_, progress)) {
         shots.push_back({shot->range(), nullptr, ""});
         continue;
       }
     } else {
-      unsaved = WorkAndLeave(*film, *shot, project_, progress);
+      WorkAndLeave(*film, *shot, file, progress);
       // The effect's own window is no trouble where it isn't what is shown.
       follows = host::Follows(*shot, {});
       if (!follows) TellTrouble(host::CropTroubleOf(*shot), *shot, progress);
@@ -105,7 +105,7 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
     }
     if (shots.size() > 1) json["shots"] = list;
     std::printf("%s\n", JsonLine(json).c_str());
-    return unsaved.Throw();
+    return file.Throw();
   }
   std::printf("%s: %zu %s of %dx%d\n", input_.c_str(), info.frame_count,
               info.frame_count == 1 ? "frame" : "frames", info.width, info.height);
@@ -117,7 +117,7 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
     }
     if (shots[s].crop) std::printf("%s\n", shots[s].text.c_str());
   }
-  unsaved.Throw();
+  file.Throw();
 }
 
 }  // namespace calmframe

@@ -91,13 +91,12 @@ host::SteadyClip& SavedShotOf(host::Film& film, const std::string& project, int 
   return *film.Open(static_cast<std::size_t>(shot) - 1);
 }
 
-bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
-                         const std::string& project, const host::WindowSettings& window,
-                         Unsaved& unsaved, ProgressLine& progress) {
+bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all, WorkFile& file,
+                         const host::WindowSettings& window, ProgressLine& progress) {
   const auto work = [&] {
-    unsaved = WorkAndLeave(film, shot, project, progress);
+    WorkAndLeave(film, shot, file, progress);
     Frame(shot, window, progress);
-    if (shot.has_new_choice()) unsaved = Leave(film, project);
+    if (shot.has_new_choice()) file.Leave(film);
   };
   try {
     work();
@@ -105,7 +104,7 @@ bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
     if (is_all) throw;
     progress.Warn(std::string(failure.what()) + "; the shot stays as it was filmed");
     shot.ShowAsFilmed(progress);
-    unsaved = Leave(film, project);  // as it is, so that those behind it keep their places
+    file.Leave(film);  // as it is, so that those behind it keep their places
     return false;
   }
   return true;
@@ -176,7 +175,7 @@ void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::stri
                 const ControlFlags& controls, const OutputFlags& flags, int threads,
                 media::ClipWriter& writer, SideBySide* both, ProgressLine& progress) {
   FilmOutcome outcome(film);
-  Unsaved unsaved;
+  WorkFile file(project);
   std::size_t drawn = 0;
   while (host::SteadyClip* const shot = NextShot(film, controls)) {
     // A shot that is still to be found ends nobody knows where.
@@ -184,8 +183,8 @@ void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::stri
     if (shot->range().first >= part.end) break;
     if (is_known && Common(part, shot->range()).size() == 0) continue;
     progress.OfShot(film.number() > 0 ? film.number() + 1 : 0);
-    const bool steadied = WorkOrLeaveAsFilmed(film, *shot, film.is_one_shot(), project,
-                                              flags.window, unsaved, progress);
+    const bool steadied =
+        WorkOrLeaveAsFilmed(film, *shot, film.is_one_shot(), file, flags.window, progress);
     const media::FrameRange frames = Common(part, shot->range());
     if (frames.size() == 0) continue;
     const std::size_t first = shot->range().first;
@@ -195,7 +194,7 @@ void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::stri
     if (steadied) outcome.Add(*shot);
   }
   outcome.Tell(progress);
-  unsaved.Throw();
+  file.Throw();
   if (both) both->Throw();
 }
 

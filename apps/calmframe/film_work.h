@@ -22,9 +22,8 @@ host::SteadyClip& SavedShotOf(host::Film& film, const std::string& project, int 
 // Works and frames the film's open shot, and leaves it in the project, as WorkAndLeave does. One
 // that can't be solved stays as it was filmed, with a warning; then false. Not so where it `is_all`
 // there is: throws SolveFailure. Throws as SteadyFilm.
-bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all,
-                         const std::string& project, const host::WindowSettings& window,
-                         Unsaved& unsaved, ProgressLine& progress);
+bool WorkOrLeaveAsFilmed(host::Film& film, host::SteadyClip& shot, bool is_all, WorkFile& file,
+                         const host::WindowSettings& window, ProgressLine& progress);
 
 // What a film's shots show, told behind all else that a run says.
 class FilmOutcome {

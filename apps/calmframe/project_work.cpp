@@ -107,28 +107,31 @@ void KeepApart(const std::string& output, const std::vector<std::string>& inputs
   }
 }
 
-void Unsaved::Throw() const {
-  if (!line_.empty()) throw media::Failure(media::Failure::Side::output, line_);
-}
+WorkFile::WorkFile(const std::string& project) : project_(project), saver_(project) {}
 
-Unsaved WorkAndLeave(host::Film& film, host::SteadyClip& shot, const std::string& project,
-                     ProgressLine& progress) {
-  const host::Reuse reuse = shot.Work(progress);
-  if (project.empty()) return Unsaved();
-  if (const std::string text = reuse.Text(); !text.empty()) progress.Note(project + ": " + text);
-  if (reuse.framing && !shot.has_new_controls()) return Unsaved();
-  return Leave(film, project);
-}
-
-Unsaved Leave(host::Film& film, const std::string& project) {
-  if (project.empty()) return Unsaved();
+void WorkFile::Leave(host::Film& film) {
+  if (project_.empty()) return;
   film.Keep();
+  trouble_.clear();
   try {
-    host::SaveProject(project, film.Saved());
+    saver_.Save(film.Saved(), film.number());
   } catch (const host::ProjectFailure& failure) {
-    return Unsaved(failure.what());
+    trouble_ = failure.what();
   }
-  return Unsaved();
+}
+
+void WorkFile::Throw() const {
+  if (!trouble_.empty()) throw media::Failure(media::Failure::Side::output, trouble_);
+}
+
+void WorkAndLeave(host::Film& film, host::SteadyClip& shot, WorkFile& file,
+                  ProgressLine& progress) {
+  const host::Reuse reuse = shot.Work(progress);
+  if (file.project().empty()) return;
+  if (const std::string text = reuse.Text(); !text.empty()) {
+    progress.Note(file.project() + ": " + text);
+  }
+  if (!reuse.framing || shot.has_new_controls()) file.Leave(film);
 }
 
 }  // namespace calmframe

@@ -56,24 +56,26 @@ std::unique_ptr<host::Film> OpenSaved(const std::string& project,
 void KeepApart(const std::string& output, const std::vector<std::string>& inputs,
                const std::string& what = "an input");
 
-// A save that failed: the work is done all the same, and whoever asked for it gets its result
-// first.
-class Unsaved {
+// Where a run leaves its work. A save that fails is told at the end: the work is done all the same,
+// and whoever asked for it gets its result first.
+class WorkFile {
  public:
-  explicit Unsaved(std::string line = "") : line_(std::move(line)) {}
-  // Throws media::Failure if there is something to tell.
+  // No project is an empty name; then nothing is saved.
+  explicit WorkFile(const std::string& project);
+
+  const std::string& project() const { return project_; }
+  // Saves the film's work, that of the open shot with it.
+  void Leave(host::Film& film);
+  // Throws media::Failure where the last save failed.
   void Throw() const;
 
  private:
-  std::string line_;
+  const std::string project_;
+  host::ProjectSaver saver_;
+  std::string trouble_;
 };
 
-// Saves the film's work, that of the open shot with it. No project is an empty name.
-[[nodiscard]] Unsaved Leave(host::Film& film, const std::string& project);
-
-// Does what is left to do of a film's open shot, tells what was reused, and saves what is new. No
-// project is an empty name.
-[[nodiscard]] Unsaved WorkAndLeave(host::Film& film, host::SteadyClip& shot,
-                                   const std::string& project, ProgressLine& progress);
+// Does what is left to do of a film's open shot, tells what was reused, and saves what is new.
+void WorkAndLeave(host::Film& film, host::SteadyClip& shot, WorkFile& file, ProgressLine& progress);
 
 }  // namespace calmframe

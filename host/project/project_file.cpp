@@ -1,22 +1,15 @@
 #include "host/project/project_file.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <algorithm>
-#include <cerrno>
 #include <cstdlib>
-#include <cstring>
 #include <filesystem>
-#include <functional>
 #include <limits>
-#include <type_traits>
 #include <utility>
 #include <vector>
 
 #include "host/media/clip_files.h"
 #include "host/media/frame_index.h"
+#include "host/project/project_format.h"
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
 
@@ -24,112 +17,6 @@ namespace calmframe::host {
 namespace {
 
 namespace fs = std::filesystem;
-using tessel::utility::Guid;
-
-constexpr std::int64_t kApplicationId = 0x43616c6d;  // "Calm", in the database's header
-// 1: the first. 2: the pixels' aspect; it was not told before. 3: the clip's frames. 4: the choice.
-// 5: several shots, where one stood among the settings before.
-constexpr std::int64_t kVersion = 5;
-
-constexpr char kChecksum[] = "checksum";
-constexpr char kCreate[] =
-    "DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS parameter; DROP TABLE IF EXISTS instance;"
-    "DROP TABLE IF EXISTS frames; DROP TABLE IF EXISTS shot;"
-    "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
-    "CREATE TABLE shot (number INTEGER PRIMARY KEY, start_frame INTEGER NOT NULL,"
-    " length INTEGER NOT NULL, choice TEXT NOT NULL, instance BLOB NOT NULL);"
-    "CREATE TABLE parameter (shot INTEGER, disk_id INTEGER, value REAL NOT NULL,"
-    " PRIMARY KEY (shot, disk_id)) WITHOUT ROWID;"
-    "CREATE TABLE frames (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
-    "PRAGMA application_id = 1130458221; PRAGMA user_version = 5;";
-static_assert(kApplicationId == 1130458221 && kVersion == 5);
-
-[[noreturn]] void Fail(const std::string& path, const std::string& cause) {
-  throw ProjectFailure(path + ": " + cause);
-}
-
-[[noreturn]] void FailForSize(const std::string& path, std::size_t most) {
-  Fail(path, "its results take more than " + std::to_string(most) +
-                 " bytes, the most that a project holds");
-}
-
-// SQLite's refusals in a user's words.
-[[noreturn]] void Fail(const std::string& path, const SqliteError& error) {
-  switch (error.code) {
-    case SQLITE_NOTADB:
-      Fail(path, "is no project");
-    case SQLITE_CORRUPT:
-    case SQLITE_ERROR:
-      Fail(path, "is damaged");
-    case SQLITE_FULL:
-      Fail(path, "the disk is full");
-    case SQLITE_BUSY:
-    case SQLITE_LOCKED:
-      Fail(path, "is in use by another program");
-    case SQLITE_READONLY:
-      Fail(path, "may not be written");
-    default:
-      Fail(path, error.what());
-  }
-}
-
-// The settings that a file of the version has, each with its place in the record. One list serves
-// both ways.
-template <class Record, class Visit>
-void VisitSettings(Record& project, std::int64_t version, const Visit& visit) {
-  auto& first = project.shots.front();
-  visit("clip_path", project.clip_path);
-  visit("clip_relative", project.clip_relative);
-  visit("clip_content", project.clip_content);
-  visit("width", project.width);
-  visit("height", project.height);
-  if (version < 5) {
-    visit("start_frame", first.start_frame);
-    visit("length", first.length);
-  }
-  visit("ticks_per_frame", project.ticks_per_frame);
-  visit("field_type", project.field_type);
-  visit("match_name", first.effect.match_name);
-  if (version < 2) return;
-  visit("pixel_aspect_num", project.pixel_aspect.num);
-  visit("pixel_aspect_den", project.pixel_aspect.den);
-  if (version == 4) visit("choice", first.choice);
-  if (version >= 5) visit("end_frame", project.end_frame);
-}
-
-// Over all that a project holds. SQLite reads a cut or flipped page as it finds it.
-Guid ChecksumOf(const Project& project, std::int64_t version) {
-  Guid sum;
-  const auto mix = [&](const void* data, std::size_t size) {
-    sum = tessel::utility::MixHash(sum, data, size);
-  };
-  VisitSettings(project, version, [&]<class Value>(const char* key, const Value& value) {
-    mix(key, std::strlen(key));
-    if constexpr (std::is_same_v<Value, std::string>) {
-      mix(value.data(), value.size());
-    } else if constexpr (std::is_same_v<Value, Guid>) {
-      mix(value.bytes().data(), value.bytes().size());
-    } else {
-      const std::int64_t number = value;
-      mix(&number, sizeof number);
-    }
-  });
-  for (const SavedShot& shot : project.shots) {
-    if (version >= 5) {
-      const std::int64_t told[] = {shot.start_frame, shot.length,
-                                   static_cast<std::int64_t>(shot.choice.size())};
-      mix(told, sizeof told);
-      mix(shot.choice.data(), shot.choice.size());
-    }
-    for (const auto& [disk_id, value] : shot.effect.values) {
-      mix(&disk_id, sizeof disk_id);
-      mix(&value, sizeof value);
-    }
-    mix(shot.effect.instance.data(), shot.effect.instance.size());
-  }
-  if (version >= 3) mix(project.clip_frames.data(), project.clip_frames.size());
-  return sum;
-}
 
 // Whatever a project tells, memory is taken for frames of this size and a span of so many, and no
 // time in ticks leaves 64 bits, which twice the span and a frame more must fit into.
@@ -154,86 +41,11 @@ bool IsWithinRanges(const Project& project) {
          project.pixel_aspect.den != 0;
 }
 
-struct SettingWriter {
-  SqliteStatement& insert;
-
-  void operator()(const char* key, const std::string& value) const { Insert(key, value); }
-  void operator()(const char* key, const Guid& value) const { Insert(key, value.ToText()); }
-  void operator()(const char* key, std::int64_t value) const { Insert(key, value); }
-
- private:
-  template <class Value>
-  void Insert(const char* key, const Value& value) const {
-    const std::string key_text = key;
-    insert.Bind(1, key_text);
-    insert.Bind(2, value);
-    insert.Step();
-  }
-};
-
-struct SettingReader {
-  SqliteStatement& select;
-
-  void operator()(const char* key, std::string& value) const {
-    Read(key, [&] { value = select.Text(0); });
-  }
-  void operator()(const char* key, Guid& value) const {
-    Read(key, [&] {
-      if (!Guid::Parse(select.Text(0), &value)) throw SqliteError(SQLITE_CORRUPT, key);
-    });
-  }
-  void operator()(const char* key, std::int32_t& value) const {
-    Read(key, [&] { value = static_cast<std::int32_t>(select.Integer(0)); });
-  }
-  void operator()(const char* key, std::uint32_t& value) const {
-    Read(key, [&] { value = static_cast<std::uint32_t>(select.Integer(0)); });
-  }
-  void operator()(const char* key, std::int64_t& value) const {
-    Read(key, [&] { value = select.Integer(0); });
-  }
-
- private:
-  void Read(const char* key, const std::function<void()>& take) const {
-    const std::string key_text = key;
-    select.Bind(1, key_text);
-    if (!select.Step()) throw SqliteError(SQLITE_CORRUPT, key);
-    take();
-    while (select.Step()) {
-    }
-  }
-};
-
 // A blob whose length stands in the column before it.
 std::vector<std::uint8_t> BytesOf(const SqliteStatement& row, int column, const std::string& path,
                                   std::size_t most) {
   if (row.Integer(column - 1) > static_cast<std::int64_t>(most)) FailForSize(path, most);
   return row.Bytes(column);
-}
-
-void Write(SqliteDatabase& database, const Project& project) {
-  SqliteStatement setting(database, "INSERT INTO setting VALUES (?, ?)");
-  VisitSettings(project, kVersion, SettingWriter{setting});
-  SettingWriter{setting}(kChecksum, ChecksumOf(project, kVersion));
-  SqliteStatement row(database, "INSERT INTO shot VALUES (?, ?, ?, ?, ?)");
-  SqliteStatement parameter(database, "INSERT INTO parameter VALUES (?, ?, ?)");
-  std::int64_t number = 0;
-  for (const SavedShot& shot : project.shots) {
-    row.Bind(1, ++number);
-    row.Bind(2, std::int64_t{shot.start_frame});
-    row.Bind(3, std::int64_t{shot.length});
-    row.Bind(4, shot.choice);
-    row.Bind(5, shot.effect.instance);
-    row.Step();
-    for (const auto& [disk_id, value] : shot.effect.values) {
-      parameter.Bind(1, number);
-      parameter.Bind(2, std::int64_t{disk_id});
-      parameter.Bind(3, value);
-      parameter.Step();
-    }
-  }
-  SqliteStatement frames(database, "INSERT INTO frames VALUES (1, ?)");
-  frames.Bind(1, project.clip_frames);
-  frames.Step();
 }
 
 void ReadShots(SqliteDatabase& database, const std::string& path, std::size_t most,
@@ -271,78 +83,7 @@ void ReadShot(SqliteDatabase& database, const std::string& path, std::size_t mos
   shot.effect.instance = BytesOf(instance, 1, path, most);
 }
 
-std::int64_t CheckedVersion(const std::string& path, SqliteDatabase& database) {
-  if (database.Number("PRAGMA application_id") != kApplicationId) Fail(path, "is no project");
-  const std::int64_t version = database.Number("PRAGMA user_version");
-  if (version > kVersion) Fail(path, "was saved by a newer version of the program");
-  return version;
-}
-
-void Sync(const fs::path& place) {
-  const int file = open(place.c_str(), O_RDONLY | O_CLOEXEC);
-  if (file < 0) return;
-  fsync(file);
-  close(file);
-}
-
-// A new file gets its name when it is whole.
-void Create(const fs::path& path, const Project& project) {
-  std::string temporary = path.parent_path() / ".";
-  temporary += path.filename().string();
-  temporary += ".XXXXXX";
-  const int made = mkstemp(temporary.data());
-  if (made < 0) Fail(path, std::strerror(errno));
-  close(made);
-  try {
-    {
-      SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
-      database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
-      database.Run(kCreate);
-      Write(database, project);
-      database.Run("COMMIT");
-    }
-    chmod(temporary.c_str(), 0644);
-    Sync(temporary);
-    fs::rename(temporary, path);
-    Sync(path.parent_path());
-  } catch (...) {
-    unlink(temporary.c_str());
-    throw;
-  }
-}
-
-void Replace(const fs::path& path, const Project& project) {
-  SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
-  CheckedVersion(path, database);
-  database.Run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
-  database.Run(kCreate);
-  Write(database, project);
-  database.Run("COMMIT");
-}
-
 }  // namespace
-
-void SaveProject(const std::string& path, const Project& project, std::size_t most) try {
-  for (const SavedShot& shot : project.shots) {
-    if (shot.effect.instance.size() > most) FailForSize(path, most);
-  }
-  if (project.clip_frames.size() > most) FailForSize(path, most);
-  std::error_code error;
-  const fs::path place = fs::weakly_canonical(fs::absolute(path), error);
-  Project saved = project;
-  const fs::path clip = fs::weakly_canonical(fs::absolute(project.clip_path), error);
-  saved.clip_path = clip;
-  saved.clip_relative = clip.lexically_relative(place.parent_path());
-  if (fs::exists(place, error)) {
-    Replace(place, saved);
-  } else {
-    Create(place, saved);
-  }
-} catch (const SqliteError& error) {
-  Fail(path, error);
-} catch (const fs::filesystem_error& error) {
-  Fail(path, error.code().message());
-}
 
 Project LoadProject(const std::string& path, std::size_t most) try {
   std::error_code error;
@@ -351,8 +92,7 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
   const std::int64_t version = CheckedVersion(path, database);
   Project project;
-  SqliteStatement setting(database, "SELECT value FROM setting WHERE key = ?");
-  VisitSettings(project, version, SettingReader{setting});
+  ReadSettings(database, version, project);
   if (version < 5) {
     SavedShot& shot = project.shots.front();
     ReadShot(database, path, most, shot);
@@ -365,10 +105,8 @@ Project LoadProject(const std::string& path, std::size_t most) try {
     if (!frames.Step()) throw SqliteError(SQLITE_CORRUPT, "frames");
     project.clip_frames = BytesOf(frames, 1, path, most);
   }
-  Guid checksum;
-  SettingReader{setting}(kChecksum, checksum);
-  if (checksum != ChecksumOf(project, version) || !IsWithinRanges(project)) {
-    throw SqliteError(SQLITE_CORRUPT, kChecksum);
+  if (SavedChecksum(database) != ChecksumOf(project, version) || !IsWithinRanges(project)) {
+    throw SqliteError(SQLITE_CORRUPT, "checksum");
   }
   return project;
 } catch (const SqliteError& error) {

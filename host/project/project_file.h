@@ -2,8 +2,10 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <stdexcept>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "host/effects/effect.h"
@@ -58,6 +60,28 @@ constexpr std::size_t kMaximumInstanceBytes = std::size_t{900} << 20;
 // as it was. An instance of more than `most` bytes is refused.
 void SaveProject(const std::string& path, const Project& project,
                  std::size_t most = kMaximumInstanceBytes);
+
+// Saves one project to one file again and again while it is worked. What a save costs doesn't grow
+// with the shots that are as they were.
+class ProjectSaver {
+ public:
+  explicit ProjectSaver(std::string path, std::size_t most = kMaximumInstanceBytes)
+      : path_(std::move(path)), most_(most) {}
+  // As SaveProject. Of the shots that it has saved before only `changed`, counted from 0, is looked
+  // at again; where it hasn't, or another one has saved to the file since, all are.
+  void Save(const Project& project, std::size_t changed);
+
+ private:
+  // Checksums of what stands in the file.
+  struct Standing {
+    std::vector<tessel::utility::Guid> shots;
+    tessel::utility::Guid frames, whole;
+  };
+
+  const std::string path_;
+  const std::size_t most_;
+  std::optional<Standing> standing_;
+};
 
 // Throws ProjectFailure: not there or not readable, no project, damaged, of a newer version, too
 // large, which is found before it is read.

@@ -197,7 +197,10 @@ void Film::Keep() {
   const auto state = shot_->effect().shared()->layer()->state();
   saved_.clip_path = medium_.info.path;
   saved_.clip_content = state->source->info().content;
-  if (medium_.found) saved_.clip_frames = medium_.found->Bytes();
+  if (medium_.found && !has_frames_) {
+    saved_.clip_frames = medium_.found->Bytes();
+    has_frames_ = medium_.found->standing() == media::Standing::decoded;
+  }
   saved_.width = medium_.info.width;
   saved_.height = medium_.info.height;
   saved_.pixel_aspect = state->source->info().pixel_aspect;

@@ -96,8 +96,9 @@ class Film {
   const std::string plugin_;
   ClipMedium medium_;  // its source tells where shots end
   const media::FrameRange range_;
-  Project saved_;      // its shots: none at first
-  ParamValues given_;  // to shots that begin anew
+  Project saved_;            // its shots: none at first
+  bool has_frames_ = false;  // saved_ has those of the clip as they will stay
+  ParamValues given_;        // to shots that begin anew
   std::unique_ptr<SteadyClip> shot_;
   std::size_t number_ = 0;
   std::size_t next_ = 0;  // frame that the shot behind the open one begins with, once it is closed

@@ -139,7 +139,7 @@ TEST_F(ProjectTest, WhatIsNoProjectIsRefusedAndLeftAlone) {
   SqliteDatabase(In("other.calm"), SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE)
       .Run("CREATE TABLE t (x)");
   SaveProject(In("newer.calm"), Sample(1));
-  SqliteDatabase(In("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 6");
+  SqliteDatabase(In("newer.calm"), SQLITE_OPEN_READWRITE).Run("PRAGMA user_version = 7");
   SaveProject(In("large.calm"), Sample(1, 5000), 5000);
   EXPECT_TRUE(All(LoadProject(In("large.calm"), 5000)) == All(Sample(1, 5000)));
   const struct {
@@ -224,6 +224,43 @@ TEST_F(ProjectTest, WhatNoClipOnALayerTellsIsDamage) {
   }
 }
 
+TEST_F(ProjectTest, ASaverWritesWhatChangedAndAllWhereItCannotKnow) {
+  const std::string path = In("walk.calm");
+  ProjectSaver saver(path);
+  Project project = Sample(2, 20000);
+  saver.Save(project, 0);
+  const auto save = [&](std::size_t changed) {
+    saver.Save(project, changed);
+    return All(LoadProject(path)) == All(project);
+  };
+  project.shots[1] = Sample(5).shots[1];
+  EXPECT_TRUE(save(1));
+  project.shots.pop_back();
+  project.clip_frames.push_back(1);
+  EXPECT_TRUE(save(1)) << "a shot fewer, another list of frames";
+  project.shots.push_back(Sample(4).shots[2]);
+  project.end_frame = Sample(4).end_frame;
+  EXPECT_TRUE(save(0)) << "a shot more, which nobody names";
+  SaveProject(path, Sample(0));
+  EXPECT_TRUE(save(1)) << "another one has saved";
+  fs::remove(path);
+  EXPECT_TRUE(save(1)) << "the file is gone";
+  project.shots[0].choice = "{}";
+  fs::rename(path, In("away"));
+  fs::create_directory(path);
+  EXPECT_THROW(saver.Save(project, 0), ProjectFailure);
+  fs::remove(path);
+  fs::rename(In("away"), path);
+  EXPECT_TRUE(save(1)) << "the save before failed";
+
+  // A row that nobody changed isn't written: one that was damaged meanwhile stays so.
+  SqliteDatabase(path, SQLITE_OPEN_READWRITE).Run("UPDATE shot SET choice = 'x' WHERE number = 1");
+  saver.Save(project, 1);
+  EXPECT_THAT([&] { LoadProject(path); }, IsRefused("is damaged"));
+  saver.Save(project, 0);
+  EXPECT_TRUE(All(LoadProject(path)) == All(project));
+}
+
 // Calls of SQLite that change files, until the one that the process does not live to see.
 int steps_left = 0;
 template <auto kCall, class... Args>
@@ -238,12 +275,18 @@ TEST_F(ProjectTest, AnyStepOfASaveMayBeTheLast) {
     system->xSetSystemCall(system, name, reinterpret_cast<sqlite3_syscall_ptr>(counted));
   };
   const std::string path = In("walk.calm");
-  for (const bool was_there : {false, true}) {
+  enum class Before { none, another, own };
+  for (const Before before : {Before::none, Before::another, Before::own}) {
+    const bool was_there = before != Before::none;
     int seen = 0, status = 1;
     for (int step = 1; status != 0; ++step) {
-      SCOPED_TRACE(testing::Message() << was_there << " " << step);
+      SCOPED_TRACE(testing::Message() << static_cast<int>(before) << " " << step);
       fs::remove(path);
-      if (was_there) SaveProject(path, Sample(1, 20000));
+      ProjectSaver saver(path);
+      if (before == Before::another) SaveProject(path, Sample(1, 20000));
+      if (before == Before::own) saver.Save(Sample(1, 20000), 0);
+      Project next = Sample(2, 20000);
+      if (before == Before::own) next.shots[0] = Sample(1, 20000).shots[0];
       const pid_t child = fork();
       ASSERT_GE(child, 0);
       if (child == 0) {
@@ -253,7 +296,7 @@ TEST_F(ProjectTest, AnyStepOfASaveMayBeTheLast) {
         count("ftruncate", &Counted<ftruncate, int, off_t>);
         count("unlink", &Counted<unlink, const char*>);
         steps_left = step;
-        SaveProject(path, Sample(2, 20000));
+        saver.Save(next, 1);
         _exit(0);
       }
       waitpid(child, &status, 0);
@@ -262,11 +305,11 @@ TEST_F(ProjectTest, AnyStepOfASaveMayBeTheLast) {
         continue;
       }
       const Project kept = LoadProject(path);
-      const int mark = kept.shots.at(0).length - 495;
+      const int mark = kept.shots.at(1).length - 495;
       EXPECT_TRUE(mark == 2 || (mark == 1 && was_there && status != 0)) << mark;
       EXPECT_GE(mark, seen) << "what was saved stays saved";
       seen = mark;
-      EXPECT_TRUE(All(kept) == All(Sample(mark, 20000)));
+      EXPECT_TRUE(All(kept) == All(mark == 2 ? next : Sample(mark, 20000)));
     }
     EXPECT_EQ(seen, 2);
   }
