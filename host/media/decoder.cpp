@@ -166,7 +166,8 @@ void Decoder::Open() {
   codec_.reset(NotNull(avcodec_alloc_context3(decoder)));
   int error = avcodec_parameters_to_context(codec_.get(), &parameters);
   codec_->pkt_timebase = stream_->time_base;
-  codec_->opaque = with_alpha ? nullptr : &complaints_;  // it gives its version as it opens
+  // Other libraries' decoders give their versions as they open.
+  codec_->opaque = decoder->wrapper_name ? nullptr : &complaints_;
   codec_->thread_count = threads_;
   codec_->thread_type = FF_THREAD_FRAME | FF_THREAD_SLICE;
   codec_->max_pixels = kMaximumPixels;

@@ -1,7 +1,6 @@
 #include "host/media/first_pass.h"
 
 #include <algorithm>
-#include <cstring>
 #include <optional>
 #include <utility>
 #include <vector>
@@ -9,12 +8,14 @@
 namespace calmframe::media {
 namespace {
 
-// A container that has a table of its packets with a time for each, and drops none of them by an
-// edit of its maker's; null or empty where there is no such promise. Of a part any container whose
-// packets have their times: it is held against them all, and numbers of frames count for little.
-std::vector<FrameTime> PromisedTimes(const std::string& path, int stream, bool of_part) {
+// The times of a stream's packets, where each has one of its own and none of them is dropped by an
+// edit of its maker's; else none. Frames that come in the order of their packets may be known by
+// the time of decoding alone, as in AVI.
+std::vector<FrameTime> PromisedTimes(const std::string& path, int stream) {
   const InputPtr container = OpenInput(path);
-  if (!of_part && !std::strstr(container->iformat->name, "mov")) return {};
+  const AVCodecDescriptor* const codec =
+      avcodec_descriptor_get(container->streams[stream]->codecpar->codec_id);
+  const bool in_order = codec && (codec->props & AV_CODEC_PROP_REORDER) == 0;
   for (unsigned i = 0; i < container->nb_streams; ++i) {
     if (static_cast<int>(i) != stream) container->streams[i]->discard = AVDISCARD_ALL;
   }
@@ -23,7 +24,8 @@ std::vector<FrameTime> PromisedTimes(const std::string& path, int stream, bool o
   int error;
   while ((error = av_read_frame(container.get(), packet.get())) >= 0) {
     const bool counts = packet->stream_index == stream;
-    const FrameTime time{TimeOrNone(packet->pts),
+    const bool by_decoding = in_order && packet->pts == AV_NOPTS_VALUE;
+    const FrameTime time{TimeOrNone(by_decoding ? packet->dts : packet->pts),
                          std::max<std::int64_t>(TimeOrNone(packet->duration), 0)};
     const bool odd = (packet->flags & (AV_PKT_FLAG_DISCARD | AV_PKT_FLAG_CORRUPT)) != 0;
     av_packet_unref(packet.get());
@@ -63,7 +65,7 @@ std::unique_ptr<FirstPass> FirstPass::Begin(const std::string& path, const ClipR
   if (!first || first->interlaced_frame || decoder->damage() > 0 || decoder->complained()) {
     return nullptr;
   }
-  std::vector<FrameTime> times = PromisedTimes(path, decoder->stream().index, part != nullptr);
+  std::vector<FrameTime> times = PromisedTimes(path, decoder->stream().index);
   if (times.empty() || times[0].pts != TimeOrNone(first->best_effort_timestamp)) return nullptr;
   const ClipInfo promised =
       InfoOf(path, *decoder, std::move(times), *first, PixelAspect(*decoder, *first), {});
