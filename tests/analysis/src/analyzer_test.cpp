@@ -21,7 +21,7 @@ class AnalyzerTest : public calmframe::host::HostRecords {
   AnalyzerTest() { hosted_.Place(0, 3); }
   ~AnalyzerTest() override {
     release_.Signal();
-    JobRegistry::Instance().CancelAll();
+    JobRegistry::Instance().CancelAll(in_.global_data);
     tessel::threads::Shutdown();
     EXPECT_EQ(FakeJob::living, 0);
   }
@@ -222,23 +222,23 @@ TEST_F(AnalyzerTest, AReloadedAnalyzerFindsItsJobAgain) {
   const auto source = analyzer->GetSourceIdentity();
   analyzer.reset();
   reached_.Wait();
-  AnalyzerPrem reloaded(record, source, Factory());
+  AnalyzerPrem reloaded(record, source, in_.global_data, Factory());
   EXPECT_TRUE(reloaded.CanGoOn());
   EXPECT_TRUE(reloaded.IsActive());
   AnalyzerRecord changed = record;
   changed.job_stage = JobStage::NotStarted;
-  EXPECT_FALSE(AnalyzerPrem(changed, source, Factory()).IsActive());
+  EXPECT_FALSE(AnalyzerPrem(changed, source, in_.global_data, Factory()).IsActive());
   changed = record;
   changed.tracker_guid = {};
-  EXPECT_FALSE(AnalyzerPrem(changed, source, Factory()).CanGoOn());
+  EXPECT_FALSE(AnalyzerPrem(changed, source, in_.global_data, Factory()).CanGoOn());
   release_.Signal();
   WaitForJob(0);
   EXPECT_TRUE(reloaded.CanGoOn());
   EXPECT_EQ(reloaded.GetFeatures()->frame_count, 3);
   Stop(reloaded);
-  EXPECT_FALSE(AnalyzerPrem(record, source, Factory()).CanGoOn());
+  EXPECT_FALSE(AnalyzerPrem(record, source, in_.global_data, Factory()).CanGoOn());
   changed.job_stage = JobStage::NotStarted;
-  EXPECT_TRUE(AnalyzerPrem(changed, {}, Factory()).CanGoOn());
+  EXPECT_TRUE(AnalyzerPrem(changed, {}, in_.global_data, Factory()).CanGoOn());
 }
 
 TEST_F(AnalyzerTest, LogsItsParametersAsNumbers) {

@@ -126,8 +126,8 @@ TEST_F(SessionTest, OtherThreadsPostAndWake) {
     EXPECT_THROW(session->Tick(), std::logic_error);
     session->Post([&] { ran = true; });
   }).join();
-  EXPECT_TRUE(host->WaitForWake(0ms));
-  EXPECT_FALSE(host->WaitForWake(0ms));
+  EXPECT_TRUE(host->wake()->Wait(0ms));
+  EXPECT_FALSE(host->wake()->Wait(0ms));
   session->Tick();
   EXPECT_TRUE(ran);
 }
