@@ -4,6 +4,7 @@
 
 #include <boost/make_shared.hpp>
 #include <new>
+#include <utility>
 
 #include "analysis/src/analysis_state.h"
 #include "analysis/src/identities.h"
@@ -114,6 +115,21 @@ TEST_F(AnalyzerTest, EqualInputSharesOneJobWhateverItsParameters) {
   EXPECT_TRUE(second->ReportFailure(&in_, &out_));
   EXPECT_EQ(TakeMessage(), "");
   EXPECT_TRUE(longer->GetFeatures());
+}
+
+TEST_F(AnalyzerTest, AnotherHostsEffectsHaveTheirOwn) {
+  stop_at_ = "get 0";
+  const auto first = Started();
+  const HX_Handle own = std::exchange(in_.global_data, reinterpret_cast<HX_Handle>(this));
+  const auto other = Started();
+  EXPECT_EQ(jobs_.size(), 2u);
+  reached_.Wait();
+  JobRegistry::Instance().CancelAll(in_.global_data);
+  in_.global_data = own;
+  release_.Signal();
+  for (std::size_t i = 0; i < 2; ++i) WaitForJob(i);
+  EXPECT_TRUE(first->GetFeatures());
+  EXPECT_FALSE(other->GetFeatures());
 }
 
 TEST_F(AnalyzerTest, AFinishedJobWaitsForLateJoinersThatWantTheSame) {
