@@ -29,7 +29,8 @@ void Fill(StabilizerState& state, std::int32_t first_frame) {
   state.phase = SolvePhase::Solved;
   analysis::AnalyzerRecord job;
   job.tracker_guid = Guid::MakeUnique();
-  state.analyzer = boost::make_shared<analysis::AnalyzerPrem>(job, Guid(), nullptr, analysis::JobFactory());
+  state.analyzer =
+      boost::make_shared<analysis::AnalyzerPrem>(job, Guid(), nullptr, analysis::JobFactory());
   state.detailed = true;
   state.progress.start_tick = 1234;
 }
