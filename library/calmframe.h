@@ -155,7 +155,7 @@ CALMFRAME_API void calmframe_options_init(calmframe_options* options);
 typedef struct calmframe_session_number* calmframe_session;
 
 /* Opens a session; what the options point at may go afterwards, but for `user`. On an error
-   *session is 0 and calmframe_error_text(0, ...) tells the cause on this thread. */
+ *session is 0 and calmframe_error_text(0, ...) tells the cause on this thread. */
 CALMFRAME_API calmframe_result calmframe_open(const calmframe_options* options,
                                               calmframe_session* session);
 
@@ -325,6 +325,18 @@ CALMFRAME_API calmframe_result calmframe_render(calmframe_session session, int64
                                                 const calmframe_image* out);
 
 /* ---- Saved work ---- */
+
+/* What frames saved work is of. */
+typedef struct calmframe_saved {
+  int32_t width, height;
+  int32_t aspect_num, aspect_den;
+  int32_t rate_num, rate_den;
+  int64_t frame_count;
+} calmframe_saved;
+
+/* Tells what a project file is of, so that a session can be opened to take it up. FILE: it is not
+   there, or none, damaged or newer. */
+CALMFRAME_API calmframe_result calmframe_get_saved_file(const char* path, calmframe_saved* saved);
 
 /* Writes what was solved to a project file, as the program does, or to bytes of the same content,
    to be given to calmframe_free. STATE: nothing is solved. */
