@@ -26,7 +26,7 @@ Options OptionsFor(const ClipFrames& frames, const PictureKind& kind) {
 
 Analysis::Analysis(const ClipFrames& frames, const PictureKind& kind, const Controls& controls,
                    std::int64_t first, std::int64_t count)
-    : kind_(kind), first_(first), count_(count), session_([&] {
+    : first_(first), count_(count), session_([&] {
         Options options = OptionsFor(frames, kind);
         options.frame_count = count;
         return options;

@@ -30,7 +30,11 @@ class Analysis {
            std::int64_t first, std::int64_t count);
 
   std::int64_t first() const { return first_; }
-  const PictureKind& kind() const { return kind_; }
+  // How many frames went in.
+  std::int64_t next() const {
+    const std::lock_guard lock(mutex_);
+    return next_;
+  }
 
   // Waits for its turn, since frame threads bring frames in a slightly wrong order; one that was
   // given before counts for nothing. True with the last frame, when the clip is solved. Throws
@@ -39,10 +43,9 @@ class Analysis {
   void Save(const std::string& path) { session_.Save(path); }
 
  private:
-  const PictureKind kind_;
   const std::int64_t first_, count_;
   Session session_;
-  std::mutex mutex_;
+  mutable std::mutex mutex_;
   std::condition_variable changed_;
   std::int64_t next_ = 0;    // guarded by mutex_
   bool is_pushing_ = false;  // guarded by mutex_

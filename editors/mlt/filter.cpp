@@ -20,10 +20,7 @@ namespace {
 class FilterState {
  public:
   explicit FilterState(mlt_filter filter) : filter_(filter) {}
-  ~FilterState() {
-    stops_ = true;
-    if (solving_.joinable()) solving_.join();
-  }
+  ~FilterState() { stops_ = true; }
   FilterState(const FilterState&) = delete;
   FilterState& operator=(const FilterState&) = delete;
 
@@ -50,7 +47,8 @@ class FilterState {
              int* height, int writable);
   // Null where there is nothing to steady with, and the picture stays.
   std::shared_ptr<Steadier> SteadierFor(mlt_frame frame, const mlt_profile_s& profile);
-  void SolveInBackground(const SteadyRequest& request, std::vector<PictureKind> kinds);
+  // Gives back the thread before, which is through but for telling others.
+  std::jthread SolveInBackground(const SteadyRequest& request, std::vector<PictureKind> kinds);
 
   // Into the log, once, and the property "error"; empty: all is well.
   void Tell(const std::string& line);
@@ -64,7 +62,7 @@ class FilterState {
   bool analysis_failed_ = false;
   std::shared_ptr<Steadier> steadier_;
   std::optional<SteadyRequest> making_, refused_;
-  std::thread solving_;
+  std::jthread solving_;  // last: it uses all of the above
 };
 
 FilterState::Place FilterState::PlaceOf(mlt_frame frame) const {
@@ -133,6 +131,11 @@ int FilterState::GetImage(mlt_frame frame, std::uint8_t** image, mlt_image_forma
   if (is_asked_for && mlt_properties_get_int(properties(), "analyze") != 0) {
     return Analyse(frame, image, format, width, height, writable);
   }
+  if (is_asked_for) {  // an analysis that nobody wants any more has left nothing
+    const std::lock_guard lock(mutex_);
+    analysis_.reset();
+    analysis_failed_ = false;
+  }
   if (is_asked_for && !Text("results").empty()) {
     return Steady(frame, image, format, width, height, writable);
   }
@@ -151,8 +154,8 @@ int FilterState::Analyse(mlt_frame frame, std::uint8_t** image, mlt_image_format
     if (code) return code;
     {
       const std::lock_guard lock(mutex_);
-      if (place.number == 0 && !analysis_) {
-        analysis_failed_ = false;
+      const bool begins_anew = analysis_ && !analysis_failed_ && analysis_->next() > 1;
+      if (place.number == 0 && (!analysis_ || begins_anew) && !analysis_failed_) {
         analysis_ = std::make_shared<Analysis>(FramesOf(frame, *profile), KindOf(frame, worked),
                                                ReadAnalysisControls(properties()),
                                                place.source_frame, place.count);
@@ -193,32 +196,33 @@ int FilterState::Analyse(mlt_frame frame, std::uint8_t** image, mlt_image_format
   return mlt_frame_get_image(frame, image, format, width, height, writable);
 }
 
-void FilterState::SolveInBackground(const SteadyRequest& request, std::vector<PictureKind> kinds) {
-  if (solving_.joinable()) solving_.join();  // it has ended: nothing is being made
-  solving_ = std::thread([this, request, kinds = std::move(kinds)] {
-    std::shared_ptr<Steadier> made;
-    try {
-      made = std::make_shared<Steadier>(request, kinds, stops_);
-      Tell("");
-    } catch (const std::exception& failure) {
-      if (!stops_) Tell(failure.what());
-    }
-    {
-      const std::lock_guard lock(mutex_);
-      if (made) {
-        steadier_ = made;
-        refused_.reset();
-      } else {
-        refused_ = request;
-      }
-      making_.reset();
-      made_.notify_all();
-    }
-    // Whoever shows the clip asks for its frames anew.
-    if (made && !stops_) {
-      mlt_events_fire(properties(), "property-changed", mlt_event_data_from_string("results"));
-    }
-  });
+std::jthread FilterState::SolveInBackground(const SteadyRequest& request,
+                                            std::vector<PictureKind> kinds) {
+  return std::exchange(solving_, std::jthread([this, request, kinds = std::move(kinds)] {
+                         std::shared_ptr<Steadier> made;
+                         try {
+                           made = std::make_shared<Steadier>(request, kinds, stops_);
+                           Tell("");
+                         } catch (const std::exception& failure) {
+                           if (!stops_) Tell(failure.what());
+                         }
+                         {
+                           const std::lock_guard lock(mutex_);
+                           if (made) {
+                             steadier_ = made;
+                             refused_.reset();
+                           } else {
+                             refused_ = request;
+                           }
+                           making_.reset();
+                           made_.notify_all();
+                         }
+                         // Whoever shows the clip asks for its frames anew.
+                         if (made && !stops_) {
+                           mlt_events_fire(properties(), "property-changed",
+                                           mlt_event_data_from_string("results"));
+                         }
+                       }));
 }
 
 std::shared_ptr<Steadier> FilterState::SteadierFor(mlt_frame frame, const mlt_profile_s& profile) {
@@ -231,6 +235,7 @@ std::shared_ptr<Steadier> FilterState::SteadierFor(mlt_frame frame, const mlt_pr
   request.rate_den = profile.frame_rate_den;
   request.display_num = profile.display_aspect_num;
   request.display_den = profile.display_aspect_den;
+  std::jthread ended;  // joined unlocked
   std::unique_lock lock(mutex_);
   // The first time the frame waits, for there is nothing else to show; later the one that stands
   // goes on while another is solved.
@@ -241,7 +246,8 @@ std::shared_ptr<Steadier> FilterState::SteadierFor(mlt_frame frame, const mlt_pr
     if (refused_ == request) return is_same_work ? steadier_ : nullptr;
     if (!making_) {
       making_ = request;
-      SolveInBackground(request, is_same_work ? steadier_->kinds() : std::vector<PictureKind>());
+      ended = SolveInBackground(request,
+                                is_same_work ? steadier_->kinds() : std::vector<PictureKind>());
     }
     if (is_same_work) return steadier_;
     made_.wait(lock);
