@@ -48,7 +48,11 @@ std::string IdentityOf(mlt_producer producer) {
   if (identity.empty()) identity = path;
   const double speed = mlt_properties_get_double(properties, "warp_speed");
   if (speed != 0) identity.append(" speed ").append(std::to_string(speed));
+  // What plays at another speed gives its own producer a profile of another rate.
   const mlt_producer parent = mlt_producer_cut_parent(producer);
+  if (const mlt_profile profile = mlt_service_profile(MLT_PRODUCER_SERVICE(parent))) {
+    identity.append(" rate ").append(std::to_string(mlt_profile_fps(profile)));
+  }
   if (mlt_service_identify(MLT_PRODUCER_SERVICE(parent)) == mlt_service_chain_type) {
     const auto chain = reinterpret_cast<mlt_chain>(parent);
     for (int i = 0; i < mlt_chain_link_count(chain); ++i) {

@@ -195,6 +195,15 @@ class MltTest(unittest.TestCase):
         self.draw("clip.mkv", FRAMES, first=50)  # another one under the name
         self.assertEqual(self.expect_as_filmed(document, "another clip"), self.frames(self.clip))
 
+    def test_another_speed_is_another_clip(self):
+        warped = self.draw("warped.mkv", FRAMES)
+        twice = ["timewarp:2:" + warped, "-attach", "calmframe"]
+        self.render([*twice, "analyze=1", "filename=clip.calm"])
+        fast = self.place("fast.mkv")
+        self.melt(twice[0], "-consumer", "avformat:" + fast, "vcodec=ffv1", "pix_fmt=yuv422p", "an=1", "real_time=-1")
+        self.assertEqual(self.render([*twice, "results=clip.calm"])[1], self.program(fast))
+        self.assertIn("another clip", self.render(["timewarp:3:" + warped, "-attach", "calmframe", "results=clip.calm"])[0])
+
     def test_another_rate_and_shape_are_refused(self):
         _, document = self.analyse(self.clip)
         with open(document, encoding="utf-8") as file:
