@@ -63,6 +63,13 @@ if(TARGET calmframe_python)
   install(FILES python/calmframe/__init__.py python/calmframe/py.typed DESTINATION "${CALMFRAME_PYTHON_DIR}/calmframe" COMPONENT python)
 endif()
 
+# Where MLT looks: its folders are relative to the places of Debian's libraries and data.
+if(TARGET mltcalmframe)
+  set_target_properties(mltcalmframe PROPERTIES INSTALL_RPATH "$ORIGIN/..")
+  install(TARGETS mltcalmframe DESTINATION "${CMAKE_INSTALL_LIBDIR}/mlt-7" COMPONENT mlt)
+  install(FILES editors/mlt/filter_calmframe.yml DESTINATION "${CMAKE_INSTALL_DATADIR}/mlt-7/calmframe" COMPONENT mlt)
+endif()
+
 # For hosts of their own.
 install(DIRECTORY platform/hx DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}/calmframe/platform" COMPONENT development FILES_MATCHING PATTERN "*.h")
 install(FILES platform/tessel/shutdown.h DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}/calmframe/platform/tessel" COMPONENT development)
@@ -90,6 +97,10 @@ if(TARGET calmframe_python)
   list(APPEND components python)
   install(FILES examples/library/steady.py DESTINATION "${CMAKE_INSTALL_DOCDIR}/examples" COMPONENT python)
   install(FILES "${PROJECT_BINARY_DIR}/changelog.gz" cmake/package/copyright DESTINATION "${doc_root}/python3-calmframe" COMPONENT python)
+endif()
+if(TARGET mltcalmframe)
+  list(APPEND components mlt)
+  install(FILES "${PROJECT_BINARY_DIR}/changelog.gz" cmake/package/copyright DESTINATION "${doc_root}/mlt-calmframe" COMPONENT mlt)
 endif()
 
 set(CPACK_GENERATOR DEB)
@@ -119,6 +130,10 @@ set(CPACK_DEBIAN_PYTHON_PACKAGE_SECTION python)
 set(CPACK_DEBIAN_PYTHON_DESCRIPTION "${PROJECT_DESCRIPTION}: the Python module\n${what_it_does}\n.\n\
 Frames are numpy arrays.")
 set(CPACK_DEBIAN_PYTHON_PACKAGE_DEPENDS "${library_package} ${same_version}, python3-numpy, ${CALMFRAME_PYTHON_DEPENDS}")
+set(CPACK_DEBIAN_MLT_PACKAGE_NAME mlt-calmframe)
+set(CPACK_DEBIAN_MLT_DESCRIPTION "${PROJECT_DESCRIPTION}: a filter for MLT\n${what_it_does}\n.\n\
+For melt, and for editors that stand on MLT.")
+set(CPACK_DEBIAN_MLT_PACKAGE_DEPENDS "${library_package} ${same_version}")
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_STRIP_FILES ON)
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)

@@ -13,6 +13,7 @@
 #include <memory>
 #include <mutex>
 #include <new>
+#include <numeric>
 #include <string>
 #include <utility>
 
@@ -338,6 +339,25 @@ calmframe_result calmframe_get_report(calmframe_session session, char** json) {
 calmframe_result calmframe_render(calmframe_session session, int64_t frame,
                                   const calmframe_image* source, const calmframe_image* out) {
   return On(session, [&](ClipSession& s) { s.Render(frame, source, out); });
+}
+
+calmframe_result calmframe_get_saved_file(const char* path, calmframe_saved* saved) {
+  try {
+    ExpectPointer(path, "path");
+    ExpectPointer(saved, "saved");
+    const calmframe::host::Project project = calmframe::host::LoadProject(path);
+    const std::int64_t divisor = std::gcd(HX_TICKS_PER_SECOND, project.ticks_per_frame);
+    *saved = {.width = project.width,
+              .height = project.height,
+              .aspect_num = project.pixel_aspect.num,
+              .aspect_den = static_cast<std::int32_t>(project.pixel_aspect.den),
+              .rate_num = static_cast<std::int32_t>(HX_TICKS_PER_SECOND / divisor),
+              .rate_den = static_cast<std::int32_t>(project.ticks_per_frame / divisor),
+              .frame_count = project.end_frame};
+    return CALMFRAME_OK;
+  } catch (...) {
+    return TellException(thread_line, kLine);
+  }
 }
 
 calmframe_result calmframe_save_file(calmframe_session session, const char* path) {

@@ -28,9 +28,7 @@
    wrong, of which calmframe_error_text has a line. No C++ exception leaves the library, and memory
    that runs out is a code. A handle that was closed, or never was one, is CALMFRAME_ERROR_ARGUMENT.
 
-   One session can be open in a process: the plug-in below it keeps one host a process. The second
-   is CALMFRAME_ERROR_BUSY until the first is closed; several clips at once take several
-   processes. */
+   Any number of sessions may be open at once. They share the processors and nothing else. */
 
 #if defined(__GNUC__)
 #define CALMFRAME_API __attribute__((visibility("default")))
@@ -50,7 +48,7 @@ enum {
   CALMFRAME_AGAIN = 1,           /* not yet: no room for a frame, or the time was up; no error */
   CALMFRAME_ERROR_ARGUMENT = -1, /* null, a wrong size or name, no session; nothing was done */
   CALMFRAME_ERROR_STATE = -2,    /* a call out of its order; nothing was done */
-  CALMFRAME_ERROR_BUSY = -3,     /* another session, or another thread in the same call */
+  CALMFRAME_ERROR_BUSY = -3,     /* another thread is in the same call */
   CALMFRAME_ERROR_MEMORY = -4,
   CALMFRAME_ERROR_PLUGIN = -5, /* the stabilizer's plug-in is not there, or doesn't start */
   CALMFRAME_ERROR_SOURCE = -6, /* a frame could not be had: refused by the caller, or gone */
@@ -157,8 +155,7 @@ CALMFRAME_API void calmframe_options_init(calmframe_options* options);
 typedef struct calmframe_session_number* calmframe_session;
 
 /* Opens a session; what the options point at may go afterwards, but for `user`. On an error
-   *session is 0 and calmframe_error_text(0, ...) tells the cause on this thread.
-   CALMFRAME_ERROR_BUSY: another one is open in this process. */
+ *session is 0 and calmframe_error_text(0, ...) tells the cause on this thread. */
 CALMFRAME_API calmframe_result calmframe_open(const calmframe_options* options,
                                               calmframe_session* session);
 
@@ -328,6 +325,18 @@ CALMFRAME_API calmframe_result calmframe_render(calmframe_session session, int64
                                                 const calmframe_image* out);
 
 /* ---- Saved work ---- */
+
+/* What frames saved work is of. */
+typedef struct calmframe_saved {
+  int32_t width, height;
+  int32_t aspect_num, aspect_den;
+  int32_t rate_num, rate_den;
+  int64_t frame_count;
+} calmframe_saved;
+
+/* Tells what a project file is of, so that a session can be opened to take it up. FILE: it is not
+   there, or none, damaged or newer. */
+CALMFRAME_API calmframe_result calmframe_get_saved_file(const char* path, calmframe_saved* saved);
 
 /* Writes what was solved to a project file, as the program does, or to bytes of the same content,
    to be given to calmframe_free. STATE: nothing is solved. */

@@ -1,6 +1,7 @@
 #include "library/clip_session.h"
 
 #include <algorithm>
+#include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstdio>
 #include <cstring>
@@ -15,8 +16,6 @@
 namespace calmframe::library {
 namespace {
 
-std::atomic<bool> one_is_open = false;
-
 [[noreturn]] void Refuse(calmframe_result code, const std::string& line) {
   throw Refusal(code, line);
 }
@@ -30,20 +29,11 @@ host::HostSettings WithExperimental() {
 
 }  // namespace
 
-ClipSession::OnlyOne::OnlyOne() {
-  if (one_is_open.exchange(true)) {
-    Refuse(CALMFRAME_ERROR_BUSY, "another session is open in this process");
-  }
-}
-
-ClipSession::OnlyOne::~OnlyOne() {
-  one_is_open = false;
-}
-
 ClipSession::ClipSession(SessionRequest request)
     : request_(std::move(request)),
       plugin_(request_.plugin),
-      feed_(request_.format, request_.clip, request_.content, request_.fetch, request_.user),
+      feed_source_(boost::make_shared<FrameFeed>(request_.format, request_.clip, request_.content,
+                                                 request_.fetch, request_.user)),
       controls_(host::Host(request_.plugin, WithExperimental()).declarations()) {}
 
 ClipSession::~ClipSession() {
@@ -59,7 +49,6 @@ void ClipSession::Close() {
     changed_.wait(lock, [this] { return users_ == 0; });
   }
   worker_.End([this] { DropFilm(); });
-  only_one_.reset();
 }
 
 // -- Controls --

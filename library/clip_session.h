@@ -1,6 +1,7 @@
 #pragma once
 
 #include <atomic>
+#include <boost/shared_ptr.hpp>
 #include <condition_variable>
 #include <cstdint>
 #include <memory>
@@ -25,7 +26,7 @@ namespace calmframe::library {
 void CloseAtEnd() noexcept;
 
 // See calmframe.h, whose functions these are. Any thread; failures are exceptions that
-// TellException knows. One at a time in a process.
+// TellException knows. Sessions have nothing in common but the processors.
 class ClipSession {
  public:
   explicit ClipSession(SessionRequest request);
@@ -65,13 +66,6 @@ class ClipSession {
  private:
   class Onlooker;
   class ShotHold;
-  // Taken while a session is open.
-  struct OnlyOne {
-    OnlyOne();
-    ~OnlyOne();
-    OnlyOne(const OnlyOne&) = delete;
-    OnlyOne& operator=(const OnlyOne&) = delete;
-  };
 
   // -- On the worker --
   void Work();
@@ -100,10 +94,11 @@ class ClipSession {
 
   double FramesPerSecond() const;
 
-  std::optional<OnlyOne> only_one_{std::in_place};
   const SessionRequest request_;
   const host::PluginLibrary plugin_;  // stays loaded from film to film
-  FrameFeed feed_;
+  // Tasks of the plug-in's that end late may still look at it.
+  const boost::shared_ptr<FrameFeed> feed_source_;
+  FrameFeed& feed_ = *feed_source_;
   std::atomic<bool> pushing_{false}, cancelled_{false}, closing_{false};
 
   mutable std::mutex mutex_;  // guards all below, up to the worker's

@@ -119,7 +119,7 @@ host::SteadyClip& ClipSession::FirstShot() {
   DropFilm();
   media::ClipInfo clip = request_.clip;
   clip.frame_count = static_cast<std::size_t>(feed_.count());
-  const host::ClipMedium medium{clip, host::SourcePtr(&feed_, [](host::Source*) {}),
+  const host::ClipMedium medium{clip, feed_source_,
                                 feed_.is_pushed() ? nullptr : std::make_shared<const AllFound>(),
                                 clip.frame_count};
   host::ShotRequest shots = request_.shots;

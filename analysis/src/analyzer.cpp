@@ -103,14 +103,15 @@ bool Analyzer::ReportFailure(HX_InData* host_in, HX_OutData* host_out) {
 AnalyzerPrem::AnalyzerPrem(HX_InData* host_in, HX_OutData* host_out,
                            const marrow::tracking::SelectorParams& selector,
                            const marrow::tracking::TrackerParams& tracker, JobFactory make_job)
-    : Analyzer(selector, tracker), make_job_(std::move(make_job)) {
+    : Analyzer(selector, tracker), plugin_(host_in->global_data), make_job_(std::move(make_job)) {
   record_.job_input_parameters = ReadJobInput(host_in, host_out);
   record_.job_guid = GetIdentifierForJobInput(record_.job_input_parameters);
 }
 
 AnalyzerPrem::AnalyzerPrem(const AnalyzerRecord& record,
-                           const tessel::utility::Guid& source_identity, JobFactory make_job)
-    : Analyzer(record, source_identity), make_job_(std::move(make_job)) {}
+                           const tessel::utility::Guid& source_identity, HX_Handle plugin,
+                           JobFactory make_job)
+    : Analyzer(record, source_identity), plugin_(plugin), make_job_(std::move(make_job)) {}
 
 JobRegistry::Entry AnalyzerPrem::FindEntry() {
   const JobRegistry::Entry entry = JobRegistry::Instance().Find(key());

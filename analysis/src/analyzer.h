@@ -93,12 +93,13 @@ class AnalyzerPrem final : public Analyzer {
   AnalyzerPrem(HX_InData* host_in, HX_OutData* host_out,
                const marrow::tracking::SelectorParams& selector,
                const marrow::tracking::TrackerParams& tracker, JobFactory make_job);
+  // `plugin`: the host's global data of the plug-in.
   AnalyzerPrem(const AnalyzerRecord& record, const tessel::utility::Guid& source_identity,
-               JobFactory make_job);
+               HX_Handle plugin, JobFactory make_job);
 
   bool IsActive() override;
-  // Joins the job that runs on equal input, whatever its parameters are, or one that finished with
-  // equal parameters; else makes one. The tracker identity becomes that of the job.
+  // Joins the host's job that runs on equal input, whatever its parameters are, or one that
+  // finished with equal parameters; else makes one. The tracker identity becomes that of the job.
   void Start(HX_InData* host_in, HX_OutData* host_out) override;
   // With the results in, leaves the finished job to late joiners for a while.
   void Stop(HX_InData* host_in, HX_OutData* host_out) override;
@@ -110,10 +111,11 @@ class AnalyzerPrem final : public Analyzer {
   void EndBefore(std::int64_t row) override;
 
  private:
-  JobRegistry::Key key() const { return {record_.job_guid, source_identity_}; }
+  JobRegistry::Key key() const { return {record_.job_guid, source_identity_, plugin_}; }
   // The registry's entry if it holds this analyzer's job.
   JobRegistry::Entry FindEntry();
 
+  const HX_Handle plugin_;
   const JobFactory make_job_;
   // The job that was started or joined. Empty in an analyzer that was read from a project until
   // it finds its job: another effect may have put a new one in its place since.

@@ -1,5 +1,6 @@
 #include "analysis/src/job_registry.h"
 
+#include <iterator>
 #include <utility>
 
 namespace kelp::analysis {
@@ -42,11 +43,15 @@ void JobRegistry::Remove(const Key& key, const tessel::utility::Guid& job_id) {
   entries_.erase(found);
 }
 
-void JobRegistry::CancelAll() {
+void JobRegistry::CancelAll(HX_Handle plugin) {
   std::map<Key, Entry> removed;
   {
     const Lock lock(lock_);
-    removed.swap(entries_);
+    for (auto entry = entries_.begin(); entry != entries_.end();) {
+      const auto next = std::next(entry);
+      if (entry->first.plugin == plugin) removed.insert(entries_.extract(entry));
+      entry = next;
+    }
   }
   for (const auto& [key, entry] : removed) CancelJob(*entry.job);
 }

@@ -8,17 +8,21 @@
 
 #include "analysis/src/analysis.h"
 #include "analysis/src/executor_job.h"
+#include "platform/hx/hx_types.h"
 #include "platform/tessel/guid.h"
 
 namespace kelp::analysis {
 
-// The jobs of the process, so that effects on equal input share one. Any thread.
+// The jobs of the process, so that a host's effects on equal input share one. Any thread.
 class JobRegistry {
  public:
   // Equal timing alone does not make two clips one: the source counts too.
   struct Key {
     tessel::utility::Guid job;     // GetIdentifierForJobInput
     tessel::utility::Guid source;  // GetUpstreamIdentifier
+    // The global data of the plug-in, of which each host has its own: a host's frames are nobody
+    // else's.
+    HX_Handle plugin = nullptr;
     auto operator<=>(const Key&) const = default;
   };
   // Two null pointers: no entry.
@@ -36,9 +40,9 @@ class JobRegistry {
                    const boost::function<Entry()>& make);
   // Removes the key's entry if it is of the job of this id.
   void Remove(const Key& key, const tessel::utility::Guid& job_id);
-  // Cancels every job and removes its entry; running jobs end on their threads. For the plug-in's
-  // end.
-  void CancelAll();
+  // Cancels every job of the host's and removes its entry; running jobs end on their threads. For
+  // the plug-in's end.
+  void CancelAll(HX_Handle plugin);
 
  private:
   JobRegistry() = default;

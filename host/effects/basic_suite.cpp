@@ -11,9 +11,9 @@ HX_Err Acquire(const char* name, std::int32_t version, const void** table) {
   const std::string_view suite = name ? name : "";
   char operation[128];
   std::snprintf(operation, sizeof operation, "acquire %s", name ? name : "");
-  return WithHost(operation, [&](Host& host) -> HX_Err {
+  return WithLent(operation, [&](Lent&) -> HX_Err {
     const void* found = FindEffectSuite(suite, version);
-    if (!found) found = host.media().FindSuite(suite, version);
+    if (!found) found = MediaServices::FindSuite(suite, version);
     if (!found) return HX_ERR_MISSING_SUITE;
     Ledger::Get().Take(suite);
     *table = found;

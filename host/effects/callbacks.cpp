@@ -30,7 +30,7 @@ HX_Err CheckoutInput(Instance& instance, std::int32_t time, std::uint32_t time_s
 
 HX_Err CheckoutParam(HX_EffectRef effect, std::int32_t index, std::int32_t time, std::int32_t,
                      std::uint32_t time_scale, HX_ParamDef* param) {
-  return WithInstance("checkout_param", effect, [&](Host& host, Instance& instance) -> HX_Err {
+  return WithInstance("checkout_param", effect, [&](Instance& instance) -> HX_Err {
     if (index == 0) {
       if (const HX_Err code = CheckoutInput(instance, time, time_scale, *param)) return code;
     } else {
@@ -38,17 +38,15 @@ HX_Err CheckoutParam(HX_EffectRef effect, std::int32_t index, std::int32_t time,
       if (!found) return HX_ERR_UNKNOWN;
       *param = *found;
     }
-    host.CountParamCheckout(1);
+    instance.host().CountParamCheckout(1);
     return HX_ERR_NONE;
   });
 }
 
 HX_Err CheckinParam(HX_EffectRef effect, HX_ParamDef* param) {
-  Host* host = Host::active();
-  if (!host) return HX_ERR_UNKNOWN;
-  host->CountParamCheckout(-1);
+  const std::shared_ptr<Instance> instance = FindInstance(effect);
+  if (Host* host = instance ? &instance->host() : Host::calling()) host->CountParamCheckout(-1);
   if (param->kind != HX_PARAM_LAYER || !param->u.ld.data) return HX_ERR_NONE;
-  const std::shared_ptr<Instance> instance = host->instances().Find(effect);
   if (!instance || !instance->frames()) return HX_ERR_UNKNOWN;
   instance->frames()->CheckInInput(param->u.ld.data);
   return HX_ERR_NONE;
@@ -60,26 +58,26 @@ HX_Err AddParam(HX_EffectRef, std::int32_t index, const HX_ParamDef* param) {
 
 HX_Err OpenStrings(HX_EffectRef, std::uint32_t number, const HX_StringTable* table,
                    std::uint64_t* token) {
-  return WithHost("open_strings", [&](Host& host) -> HX_Err {
+  return WithLent("open_strings", [&](Lent& lent) -> HX_Err {
     if (!table || table->number != number) return HX_ERR_UNKNOWN;
-    *token = host.OpenStrings(*table);
+    *token = lent.strings.Open(*table);
     return HX_ERR_NONE;
   });
 }
 
 const char* GetString(std::uint64_t token, std::int32_t index, std::int32_t, std::int32_t) {
-  const Host* host = Host::active();
-  return host ? host->GetString(token, index) : nullptr;
+  const Lent* lent = Lent::active();
+  return lent ? lent->strings.Get(token, index) : nullptr;
 }
 
 void CloseStrings(std::uint64_t token) {
-  if (Host* host = Host::active()) host->CloseStrings(token);
+  if (Lent* lent = Lent::active()) lent->strings.Close(token);
 }
 
 HX_Handle NewHandle(std::uint64_t size) {
   HX_Handle handle = nullptr;
-  WithHost("new_handle", [&](Host& host) -> HX_Err {
-    handle = host.handles().New(size);
+  WithLent("new_handle", [&](Lent& lent) -> HX_Err {
+    handle = lent.handles.New(size);
     return HX_ERR_NONE;
   });
   return handle;
@@ -87,29 +85,28 @@ HX_Handle NewHandle(std::uint64_t size) {
 
 void* LockHandle(HX_Handle handle) {
   void* block = nullptr;
-  WithHost("lock_handle", [&](Host& host) -> HX_Err {
-    block = host.handles().Lock(handle);
+  WithLent("lock_handle", [&](Lent& lent) -> HX_Err {
+    block = lent.handles.Lock(handle);
     return HX_ERR_NONE;
   });
   return block;
 }
 
 void UnlockHandle(HX_Handle handle) {
-  if (Host* host = Host::active()) host->handles().Unlock(handle);
+  if (Lent* lent = Lent::active()) lent->handles.Unlock(handle);
 }
 
 void DisposeHandle(HX_Handle handle) {
-  if (Host* host = Host::active()) host->handles().Dispose(handle);
+  if (Lent* lent = Lent::active()) lent->handles.Dispose(handle);
 }
 
 HX_Err ResizeHandle(HX_Handle* handle, std::uint64_t size) {
-  return WithHost("resize_handle",
-                  [&](Host& host) { return host.handles().Resize(*handle, size); });
+  return WithLent("resize_handle", [&](Lent& lent) { return lent.handles.Resize(*handle, size); });
 }
 
 std::uint64_t HandleSize(HX_Handle handle) {
-  Host* host = Host::active();
-  return host ? host->handles().Size(handle) : 0;
+  Lent* lent = Lent::active();
+  return lent ? lent->handles.Size(handle) : 0;
 }
 
 #if defined(__GNUC__)
@@ -137,32 +134,33 @@ void CopyText(char* to, std::uint32_t size, const char* from) {
 
 HX_Err CopyWorldCallback(HX_EffectRef, const HX_World* from, HX_World* to, const HX_Rect* from_rect,
                          const HX_Rect* to_rect) {
-  return WithHost("copy_world", [&](Host&) { return CopyWorld(*from, *to, from_rect, to_rect); });
+  return Guarded("copy_world", [&] { return CopyWorld(*from, *to, from_rect, to_rect); });
 }
 
 HX_Err TransferCallback(HX_EffectRef, const HX_World* from, const HX_TransferMode* mode,
                         const void* mask, std::int32_t x, std::int32_t y, HX_World* to) {
-  return WithHost("transfer", [&](Host&) -> HX_Err {
+  return Guarded("transfer", [&]() -> HX_Err {
     return mask ? HX_ERR_UNKNOWN : Transfer(*from, *mode, x, y, *to);
   });
 }
 
 // Begin and end of a direct render; the table's rows mean nothing to this host. An end that is made
 // to fail has ended the render all the same.
-HX_Err Utility(HX_EffectRef, std::int32_t operation, const void* table) {
-  if (operation == HX_UTILITY_END_RENDER) {
-    if (Host* host = Host::active()) host->CountDirectRender(-1);
-  }
-  return WithHost("utility", [&](Host& host) -> HX_Err {
+HX_Err Utility(HX_EffectRef effect, std::int32_t operation, const void* table) {
+  const std::shared_ptr<Instance> instance = FindInstance(effect);
+  Host* const host = instance ? &instance->host() : Host::calling();
+  if (operation == HX_UTILITY_END_RENDER && host) host->CountDirectRender(-1);
+  return Guarded("utility", [&]() -> HX_Err {
+    if (!host) return HX_ERR_UNKNOWN;
     if (operation == HX_UTILITY_END_RENDER) return HX_ERR_NONE;
     if (operation != HX_UTILITY_BEGIN_RENDER || !table) return HX_ERR_UNKNOWN;
-    host.CountDirectRender(1);
+    host->CountDirectRender(1);
     return HX_ERR_NONE;
   });
 }
 
 HX_Err HlsToRgb(HX_EffectRef, const std::int32_t hls[3], HX_Pixel8* rgb) {
-  return WithHost("hls_to_rgb", [&](Host&) -> HX_Err {
+  return Guarded("hls_to_rgb", [&]() -> HX_Err {
     *rgb = ColourOfHls(hls);
     return HX_ERR_NONE;
   });

@@ -46,7 +46,7 @@ Effect::Effect(Host& host, boost::shared_ptr<Layer> layer, std::size_t position,
 }
 
 Effect::~Effect() {
-  const Host::LoopCall on_loop;
+  const LoopWake::Call on_loop;
   instance_->Destroy({playhead_});
   DisposeOfDeletions();
   standing_.reset();
@@ -69,12 +69,12 @@ CommandResult Effect::Command(std::uint32_t command, void* extra) {
   if (flattened_) {
     if (CommandResult restored = Restore(); !restored.ok()) return restored;
   }
-  const Host::LoopCall on_loop;
+  const LoopWake::Call on_loop;
   return instance_->Call(command, {playhead_}, nullptr, extra);
 }
 
 CommandResult Effect::Restore() {
-  const Host::LoopCall on_loop;
+  const LoopWake::Call on_loop;
   CommandResult result = instance_->Call(HX_CMD_RESTORE_INSTANCE, {playhead_});
   // A plug-in that failed may have left the handle as it was; then it is tried again.
   if (result.ok() || instance_->handle() != flattened_) flattened_ = nullptr;
@@ -117,7 +117,7 @@ CommandResult Effect::DeletionsOp(HX_CustomDataExtra& extra) {
   extra.param_id = kDeletionsDiskId;
   HX_InData in{};
   HX_OutData out{};
-  const Host::LoopCall on_loop;
+  const LoopWake::Call on_loop;
   return host_.Command(HX_CMD_CUSTOM_DATA_OP, in, out, nullptr, nullptr, &extra);
 }
 

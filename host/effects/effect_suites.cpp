@@ -24,21 +24,19 @@ void CopyUTF16(const std::string& text, std::uint16_t* to, std::uint32_t max) {
 // -- Param Utils --
 
 HX_Err UpdateParamUI(HX_EffectRef effect, std::int32_t index, const HX_ParamDef* param) {
-  return WithInstance(
-      "Param Utils.UpdateParamUI", effect, [&](Host&, Instance& instance) -> HX_Err {
-        return instance.effect()->params().UpdateUI(index, *param) ? HX_ERR_NONE : HX_ERR_UNKNOWN;
-      });
+  return WithInstance("Param Utils.UpdateParamUI", effect, [&](Instance& instance) -> HX_Err {
+    return instance.effect()->params().UpdateUI(index, *param) ? HX_ERR_NONE : HX_ERR_UNKNOWN;
+  });
 }
 
 HX_Err SetParamValue(HX_EffectRef effect, std::int32_t index, const HX_ParamDef* param) {
-  return WithInstance("Param Utils.SetParamValue", effect,
-                      [&](Host&, Instance& instance) -> HX_Err {
-                        if (!instance.effect()->params().SetByPlugin(index, *param)) {
-                          return HX_ERR_UNKNOWN;
-                        }
-                        instance.effect()->InvalidateRenders();
-                        return HX_ERR_NONE;
-                      });
+  return WithInstance("Param Utils.SetParamValue", effect, [&](Instance& instance) -> HX_Err {
+    if (!instance.effect()->params().SetByPlugin(index, *param)) {
+      return HX_ERR_UNKNOWN;
+    }
+    instance.effect()->InvalidateRenders();
+    return HX_ERR_NONE;
+  });
 }
 
 constexpr HX_ParamUtilsSuite3 kParamUtils = {UpdateParamUI, SetParamValue};
@@ -47,7 +45,7 @@ constexpr HX_ParamUtilsSuite3 kParamUtils = {UpdateParamUI, SetParamValue};
 
 template <typename Value, typename Get>
 HX_Err Tell(const char* operation, HX_EffectRef effect, Value* value, Get get) {
-  return WithInstance(operation, effect, [&](Host&, Instance& instance) -> HX_Err {
+  return WithInstance(operation, effect, [&](Instance& instance) -> HX_Err {
     *value = get(*instance.effect(), *instance.layer());
     return HX_ERR_NONE;
   });
@@ -56,8 +54,8 @@ HX_Err Tell(const char* operation, HX_EffectRef effect, Value* value, Get get) {
 template <typename Get>
 HX_Err TellText(const char* operation, HX_EffectRef effect, std::uint16_t* text, std::uint32_t max,
                 Get get) {
-  return WithInstance(operation, effect, [&](Host& host, Instance& instance) -> HX_Err {
-    CopyUTF16(get(host, *instance.layer()), text, max);
+  return WithInstance(operation, effect, [&](Instance& instance) -> HX_Err {
+    CopyUTF16(get(instance.host(), *instance.layer()), text, max);
     return HX_ERR_NONE;
   });
 }
@@ -110,7 +108,7 @@ constexpr HX_UtilitySuite kUtility = {
 // -- Private Effect --
 
 HX_Err ConvertText(const std::uint16_t* from, char* to, std::uint32_t max) {
-  return WithHost("Private Effect.ConvertText", [&](Host&) -> HX_Err {
+  return Guarded("Private Effect.ConvertText", [&]() -> HX_Err {
     std::u16string text;
     for (; *from; ++from) text += static_cast<char16_t>(*from);
     Callbacks().copy_text(to, max, tessel::utility::ToUTF8(text).c_str());
@@ -120,7 +118,7 @@ HX_Err ConvertText(const std::uint16_t* from, char* to, std::uint32_t max) {
 
 HX_Err GetLayerData(HX_EffectRef effect, std::int32_t, void*) {
   return WithInstance("Private Effect.GetLayerData", effect,
-                      [](Host&, Instance&) -> HX_Err { return HX_ERR_UNKNOWN; });
+                      [](Instance&) -> HX_Err { return HX_ERR_UNKNOWN; });
 }
 
 HX_Err ReservedOfEffect(HX_EffectRef) {
@@ -128,10 +126,10 @@ HX_Err ReservedOfEffect(HX_EffectRef) {
 }
 
 HX_Err ForceRerender(HX_EffectRef effect) {
-  return WithHost("Private Effect.ForceRerender", [&](Host& host) -> HX_Err {
-    if (const std::shared_ptr<Instance> instance = host.instances().Find(effect)) {
+  return Guarded("Private Effect.ForceRerender", [&]() -> HX_Err {
+    if (const std::shared_ptr<Instance> instance = FindInstance(effect)) {
       instance->effect()->InvalidateRenders();
-      host.Wake();
+      instance->wake().Wake();
     }
     return HX_ERR_NONE;
   });
@@ -174,20 +172,20 @@ constexpr HX_AdvAppSuite1 kAdvApp = {RefreshAllWindows, InfoText};
 
 HX_Err NewWorld(HX_EffectRef, std::int32_t width, std::int32_t height, std::uint8_t clear,
                 std::uint32_t format, HX_World* world) {
-  return WithHost("World.NewWorld", [&](Host& host) {
-    return host.worlds().New(width, height, clear != 0, format, world);
+  return WithLent("World.NewWorld", [&](Lent& lent) {
+    return lent.worlds.New(width, height, clear != 0, format, world);
   });
 }
 
 // Not to be failed: who gives back a world can't do more about it.
 HX_Err DisposeWorld(HX_EffectRef, HX_World* world) {
-  Host* host = Host::active();
-  return host ? host->worlds().Dispose(world) : HX_ERR_UNKNOWN;
+  Lent* lent = Lent::active();
+  return lent ? lent->worlds.Dispose(world) : HX_ERR_UNKNOWN;
 }
 
 HX_Err BlurOperation(HX_EffectRef, const HX_World* from, HX_World* to, float radius, std::int32_t,
                      std::int32_t, std::int32_t, std::int32_t) {
-  return WithHost("Blur.Blur", [&](Host&) { return Blur(*from, *to, radius); });
+  return Guarded("Blur.Blur", [&] { return Blur(*from, *to, radius); });
 }
 
 constexpr HX_WorldSuite2 kWorld = {NewWorld, DisposeWorld};
@@ -196,19 +194,19 @@ constexpr HX_BlurSuite1 kBlur = {BlurOperation};
 // -- Analysis Host, Stabilizer Host --
 
 HX_Err CancelJob(HX_EffectRef) {
-  return WithHost("Analysis Host.CancelJob", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+  return Guarded("Analysis Host.CancelJob", [] { return HX_ERR_NONE; });
 }
 HX_Err ReportJobEnd(HX_EffectRef, std::uint8_t) {
-  return WithHost("Analysis Host.ReportJobEnd", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+  return Guarded("Analysis Host.ReportJobEnd", [] { return HX_ERR_NONE; });
 }
 HX_Err IsScheduled(HX_EffectRef, std::uint8_t* scheduled) {
-  return WithHost("Analysis Host.IsScheduled", [&](Host&) -> HX_Err {
+  return Guarded("Analysis Host.IsScheduled", [&]() -> HX_Err {
     *scheduled = 0;
     return HX_ERR_NONE;
   });
 }
 HX_Err MayStart(HX_EffectRef, std::uint8_t* may) {
-  return WithHost("Analysis Host.MayStart", [&](Host&) -> HX_Err {
+  return Guarded("Analysis Host.MayStart", [&]() -> HX_Err {
     *may = 1;
     return HX_ERR_NONE;
   });
@@ -220,7 +218,7 @@ HX_Err GetCompressionPreference(std::uint8_t* raw) {
   });
 }
 HX_Err ScheduleAnalysis(HX_EffectRef) {
-  return WithHost("Analysis Host.ScheduleAnalysis", [](Host&) -> HX_Err { return HX_ERR_NONE; });
+  return Guarded("Analysis Host.ScheduleAnalysis", [] { return HX_ERR_NONE; });
 }
 HX_Err GetRefusal(HX_EffectRef effect, std::uint16_t* text, std::uint32_t max) {
   return TellText("Analysis Host.GetRefusal", effect, text, max,
@@ -229,12 +227,11 @@ HX_Err GetRefusal(HX_EffectRef effect, std::uint16_t* text, std::uint32_t max) {
 
 HX_Err SetFramePolygon(HX_EffectRef effect, std::uint32_t count, const float* xy,
                        std::int32_t frame) {
-  return WithInstance("Stabilizer Host.SetFramePolygon", effect,
-                      [&](Host&, Instance& instance) -> HX_Err {
-                        const std::size_t size = std::size_t{count} * 2;
-                        instance.effect()->SetPolygon(frame, std::vector<float>(xy, xy + size));
-                        return HX_ERR_NONE;
-                      });
+  return WithInstance("Stabilizer Host.SetFramePolygon", effect, [&](Instance& instance) -> HX_Err {
+    const std::size_t size = std::size_t{count} * 2;
+    instance.effect()->SetPolygon(frame, std::vector<float>(xy, xy + size));
+    return HX_ERR_NONE;
+  });
 }
 
 constexpr HX_AnalysisHostSuite1 kAnalysisHost = {
@@ -256,22 +253,22 @@ constexpr HX_AnalysisSpanSuite1 kAnalysisSpan = {GetEnd};
 // -- Opaque Effect Data --
 
 HX_Err FindOpaque(std::uint64_t reference, void** block) {
-  return WithHost("Opaque Effect Data.Find", [&](Host& host) -> HX_Err {
-    *block = host.opaque_data().Find(reference);
+  return WithLent("Opaque Effect Data.Find", [&](Lent& lent) -> HX_Err {
+    *block = lent.opaque_data.Find(reference);
     return HX_ERR_NONE;
   });
 }
 HX_Err SetOpaque(std::uint64_t reference, void* block, void** winner) {
-  return WithHost("Opaque Effect Data.Set", [&](Host& host) -> HX_Err {
-    *winner = host.opaque_data().Set(reference, block);
+  return WithLent("Opaque Effect Data.Set", [&](Lent& lent) -> HX_Err {
+    *winner = lent.opaque_data.Set(reference, block);
     return HX_ERR_NONE;
   });
 }
 // Not to be failed: a use that stays would keep the block for ever.
 HX_Err ReleaseOpaque(std::uint64_t reference, std::uint8_t* last) {
-  Host* host = Host::active();
-  if (!host) return HX_ERR_UNKNOWN;
-  *last = host->opaque_data().Release(reference) ? 1 : 0;
+  Lent* lent = Lent::active();
+  if (!lent) return HX_ERR_UNKNOWN;
+  *last = lent->opaque_data.Release(reference) ? 1 : 0;
   return HX_ERR_NONE;
 }
 

@@ -1,9 +1,11 @@
 #include "host/effects/host.h"
 
 #include <cstring>
+#include <list>
+#include <mutex>
 #include <new>
-#include <stdexcept>
 #include <utility>
+#include <vector>
 
 #include "host/base/operations.h"
 #include "host/effects/interface_tables.h"
@@ -14,30 +16,53 @@
 namespace calmframe::host {
 namespace {
 
-std::atomic<Host*> active_host{nullptr};
-thread_local int loop_calls = 0;
-
 constexpr char kExperimental[] = "ShowExperimentalEffectParameters";
+
+thread_local Host* commanding = nullptr;  // whose command runs on this thread
+
+// The process's hosts.
+struct Hosts {
+  std::mutex mutex;
+  std::vector<Host*> running;         // guarded by mutex
+  std::atomic<Host*> only = nullptr;  // that runs; null where there are several, too
+  // Of hosts that are gone while tasks of their plug-ins may still run. Guarded by mutex.
+  std::list<PluginLibrary> kept;
+  int experimental = 0;       // that want the debug option; guarded by mutex
+  bool was_set_here = false;  // guarded by mutex
+};
+
+Hosts& AllHosts() {
+  static Hosts& hosts = *new Hosts;  // outlives threads that ask at the process's end
+  return hosts;
+}
+
+class Commanding {
+ public:
+  explicit Commanding(Host& host) : before_(std::exchange(commanding, &host)) {}
+  ~Commanding() { commanding = before_; }
+  Commanding(const Commanding&) = delete;
+  Commanding& operator=(const Commanding&) = delete;
+
+ private:
+  Host* const before_;
+};
 
 }  // namespace
 
-Host::LoopCall::LoopCall() {
-  ++loop_calls;
-}
-
-Host::LoopCall::~LoopCall() {
-  --loop_calls;
-}
-
-Host::ExperimentalParameters::ExperimentalParameters(bool wanted)
-    : sets_(wanted && !tessel::debug::DebugDatabase::GetBool(kExperimental)) {
-  if (!sets_) return;
+Host::ExperimentalParameters::ExperimentalParameters(bool wanted) : wanted_(wanted) {
+  Hosts& hosts = AllHosts();
+  const std::lock_guard lock(hosts.mutex);
+  if (!wanted_ || hosts.experimental++ > 0) return;
+  hosts.was_set_here = !tessel::debug::DebugDatabase::GetBool(kExperimental);
+  if (!hosts.was_set_here) return;
   tessel::debug::DebugDatabase::Set(kExperimental, 1);
   tessel::debug::SetSink([](const std::string&) {});
 }
 
 Host::ExperimentalParameters::~ExperimentalParameters() {
-  if (!sets_) return;
+  Hosts& hosts = AllHosts();
+  const std::lock_guard lock(hosts.mutex);
+  if (!wanted_ || --hosts.experimental > 0 || !hosts.was_set_here) return;
   try {
     tessel::debug::DebugDatabase::Set(kExperimental, 0);
     tessel::debug::SetSink({});
@@ -45,8 +70,32 @@ Host::ExperimentalParameters::~ExperimentalParameters() {
   }
 }
 
-Host* Host::active() {
-  return active_host.load();
+Host::Running::Running(Host& host) : host_(host) {
+  Hosts& hosts = AllHosts();
+  const std::lock_guard lock(hosts.mutex);
+  hosts.running.push_back(&host);
+  const bool is_only = hosts.running.size() == 1;
+  hosts.only = is_only ? &host : nullptr;
+  if (is_only) Ledger::Get().Reset();
+}
+
+// Whoever starts meanwhile waits: its tasks are not to be ended with those of the others.
+Host::Running::~Running() {
+  Hosts& hosts = AllHosts();
+  const std::lock_guard lock(hosts.mutex);
+  std::erase(hosts.running, &host_);
+  if (!hosts.running.empty()) {
+    hosts.only = hosts.running.size() == 1 ? hosts.running.front() : nullptr;
+    return;
+  }
+  tessel::importer::PauseBackgroundWork(false);
+  tessel::threads::Shutdown();
+  hosts.only = nullptr;
+  hosts.kept.clear();
+}
+
+Host* Host::calling() {
+  return commanding ? commanding : AllHosts().only.load();
 }
 
 Host::Host(const std::string& library, const HostSettings& settings)
@@ -56,39 +105,38 @@ Host::Host(PluginLibrary library, const HostSettings& settings)
     : settings_(settings),
       keeps_analysis_raw_(settings.keeps_analysis_raw),
       experimental_(settings.experimental_parameters),
-      library_(std::move(library)),
       media_(settings.media),
       declarations_(1) {
-  Host* none = nullptr;
-  if (!active_host.compare_exchange_strong(none, this)) {
-    throw std::logic_error("a process has one host at a time");
-  }
-  Ledger::Get().Reset();
+  library_.push_back(std::move(library));
+  running_.emplace(*this);
   declarations_[0].kind = HX_PARAM_LAYER;
   try {
     Start();
     DeclareParams();
   } catch (...) {
     Stop();
-    active_host = nullptr;
     throw;
   }
 }
 
 Host::~Host() {
   Stop();
-  active_host = nullptr;
+  // Tasks that end late may still be of it.
+  Hosts& hosts = AllHosts();
+  const std::lock_guard lock(hosts.mutex);
+  if (hosts.running.empty()) return;
+  for (const PluginLibrary& kept : hosts.kept) {
+    if (kept.entry() == this->library().entry()) return;
+  }
+  hosts.kept.splice(hosts.kept.end(), library_);
 }
 
 void Host::Start() {
   HX_InData in{};
   HX_OutData out{};
-  running_ = true;
   const CommandResult result = Command(HX_CMD_START_PLUGIN, in, out);
-  if (!result.ok()) {
-    running_ = false;
-    throw PluginError(result.Line(library_.path()));
-  }
+  if (!result.ok()) throw PluginError(result.Line(library().path()));
+  started_ = true;
   version_ = out.version;
   out_flags_ = out.out_flags;
   out_flags2_ = out.out_flags2;
@@ -100,25 +148,24 @@ void Host::DeclareParams() {
   declaring_ = true;
   const CommandResult result = Command(HX_CMD_DECLARE_PARAMS, in, out);
   declaring_ = false;
-  if (!result.ok()) throw PluginError(result.Line(library_.path()));
+  if (!result.ok()) throw PluginError(result.Line(library().path()));
   const auto declared = static_cast<std::int32_t>(declarations_.size());
   if (out.num_params != declared && !(out.num_params == 0 && declared == 1)) {
-    throw PluginError(library_.path() + ": tells of " + std::to_string(out.num_params) +
+    throw PluginError(library().path() + ": tells of " + std::to_string(out.num_params) +
                       " parameters and declares " + std::to_string(declared));
   }
 }
 
 CommandResult Host::Stop() {
-  if (!running_) return {};
-  running_ = false;
-  tessel::importer::PauseBackgroundWork(false);
-  HX_InData in{};
-  HX_OutData out{};
-  const CommandResult result = Command(HX_CMD_STOP_PLUGIN, in, out);
-  // A job that is still at work ends by the renders that it is refused; then nothing of the
-  // plug-in's runs any more.
+  CommandResult result;
+  if (std::exchange(started_, false)) {
+    HX_InData in{};
+    HX_OutData out{};
+    result = Command(HX_CMD_STOP_PLUGIN, in, out);
+  }
+  // A job that is still at work ends by the renders that it is refused.
   media_.Shutdown();
-  tessel::threads::Shutdown();
+  running_.reset();
   return result;
 }
 
@@ -142,8 +189,9 @@ CommandResult Host::Command(std::uint32_t command, HX_InData& in, HX_OutData& ou
   out.instance_handle = in.instance_handle;
   out.global_data = global_data;
   CommandResult result;
+  const Commanding from_here(*this);
   try {
-    result.code = library_.entry()(command, &in, &out, params, output, extra);
+    result.code = library().entry()(command, &in, &out, params, output, extra);
   } catch (...) {
     Ledger::Get().Mistake("entry: an exception came out");
     result.code = HX_ERR_UNKNOWN;
@@ -158,22 +206,6 @@ CommandResult Host::Command(std::uint32_t command, HX_InData& in, HX_OutData& ou
   return result;
 }
 
-void Host::Wake() {
-  if (loop_calls > 0) return;
-  {
-    std::lock_guard lock(wake_mutex_);
-    if (woken_) return;
-    woken_ = true;
-  }
-  woken_changed_.notify_one();
-}
-
-bool Host::WaitForWake(std::chrono::milliseconds time) {
-  std::unique_lock lock(wake_mutex_);
-  woken_changed_.wait_for(lock, time, [this] { return woken_; });
-  return std::exchange(woken_, false);
-}
-
 HX_Err Host::AddParam(std::int32_t index, const HX_ParamDef& param) {
   if (!declaring_ || index != -1) return HX_ERR_UNKNOWN;
   declarations_.push_back(param);
@@ -182,40 +214,19 @@ HX_Err Host::AddParam(std::int32_t index, const HX_ParamDef& param) {
   return HX_ERR_NONE;
 }
 
-std::uint64_t Host::OpenStrings(const HX_StringTable& table) {
-  auto strings = std::make_unique<tessel::config::StringTable>(table.literals, table.count);
-  std::lock_guard lock(strings_mutex_);
-  strings_[++last_token_] = std::move(strings);
-  return last_token_;
-}
-
-const char* Host::GetString(std::uint64_t token, std::int32_t index) const {
-  std::lock_guard lock(strings_mutex_);
-  const auto found = strings_.find(token);
-  return found == strings_.end() ? nullptr : found->second->Get(index);
-}
-
-void Host::CloseStrings(std::uint64_t token) {
-  std::lock_guard lock(strings_mutex_);
-  if (strings_.erase(token) == 0) Ledger::Get().Mistake("close_strings: not open");
-}
-
 std::string Host::LeakReport() const {
   std::string text;
   const auto tell = [&text](const char* kind, std::int64_t count) {
     if (count != 0) text += std::to_string(count) + " of " + kind + " left\n";
   };
-  tell("instance", static_cast<std::int64_t>(instances_.size()));
-  tell("handle", static_cast<std::int64_t>(handles_.count()));
-  tell("handle lock", static_cast<std::int64_t>(handles_.locks()));
-  tell("world", static_cast<std::int64_t>(worlds_.count()));
-  tell("opaque data use", static_cast<std::int64_t>(opaque_data_.uses()));
+  tell("instance", static_cast<std::int64_t>(lent_->instances.size()));
+  tell("handle", static_cast<std::int64_t>(lent_->handles.count()));
+  tell("handle lock", static_cast<std::int64_t>(lent_->handles.locks()));
+  tell("world", static_cast<std::int64_t>(lent_->worlds.count()));
+  tell("opaque data use", static_cast<std::int64_t>(lent_->opaque_data.uses()));
   tell("parameter checkout", param_checkouts_);
   tell("direct render", direct_renders_);
-  {
-    std::lock_guard lock(strings_mutex_);
-    tell("string table", static_cast<std::int64_t>(strings_.size()));
-  }
+  tell("string table", static_cast<std::int64_t>(lent_->strings.count()));
   const MediaCounts media = media_.counts();
   tell("node", static_cast<std::int64_t>(media.nodes));
   tell("segments", static_cast<std::int64_t>(media.segments));

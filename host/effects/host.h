@@ -2,23 +2,19 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstdint>
-#include <map>
+#include <list>
 #include <memory>
-#include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
-#include "host/effects/handle_store.h"
 #include "host/effects/instance.h"
-#include "host/effects/instance_registry.h"
-#include "host/effects/opaque_store.h"
+#include "host/effects/lent.h"
+#include "host/effects/loop_wake.h"
 #include "host/effects/user_interface.h"
-#include "host/effects/world_store.h"
 #include "host/plugin/plugin_library.h"
 #include "host/timeline/media_services.h"
-#include "platform/tessel/config.h"
 
 namespace calmframe::host {
 
@@ -32,9 +28,11 @@ struct HostSettings {
   bool experimental_parameters = false;
 };
 
-// A plug-in in this process, started, and all that it may ask of its host. One at a time in a
-// process, since the interface's functions carry no host. Operations that the plug-in asks for can
-// be made to fail by Operations; what it does wrong is in the Ledger.
+// A plug-in in this process, started, and all that it may ask of its host. Several in a process
+// work side by side, each with effects, media and a loop of its own, and each on a thread of its
+// own; what they have lent is in one place (Lent), since most of the interface's functions carry no
+// host. Operations that the plug-in asks for can be made to fail by Operations; what it does wrong
+// is in the Ledger. Both are the process's.
 class Host {
  public:
   // Loads the library, starts the plug-in and collects its parameters. Throws PluginError, whose
@@ -46,14 +44,16 @@ class Host {
   Host(const Host&) = delete;
   Host& operator=(const Host&) = delete;
 
-  static Host* active();  // null when there is none
+  // Whose command runs on this thread; else the only host that there is; else null.
+  static Host* calling();
 
   // Stops the plug-in: its last command, an end to all renders and background tasks. All effects
   // and renderers are gone, and no other thread uses the host. The library stays loaded until the
-  // host goes.
+  // host goes. While others run, tasks that were told to end may still do so; the last one waits
+  // for all of them, and until then no library goes that they may be of.
   CommandResult Stop();
 
-  const PluginLibrary& library() const { return library_; }
+  const PluginLibrary& library() const { return library_.front(); }
   // Index 0 is the layer, the others are the plug-in's in their order.
   const std::vector<HX_ParamDef>& declarations() const { return declarations_; }
   // What the start told, beside what the property record does.
@@ -69,13 +69,14 @@ class Host {
   bool keeps_analysis_raw() const { return keeps_analysis_raw_; }
   MediaServices& media() { return media_; }
   UserInterface& user_interface() { return user_interface_; }
-  HandleStore& handles() { return handles_; }
-  OpaqueStore& opaque_data() { return opaque_data_; }
-  WorldStore& worlds() { return worlds_; }
-  InstanceRegistry& instances() { return instances_; }
+  // The process's, for all its hosts; they begin anew with the first one.
+  HandleStore& handles() { return lent_->handles; }
+  OpaqueStore& opaque_data() { return lent_->opaque_data; }
+  WorldStore& worlds() { return lent_->worlds; }
+  InstanceRegistry& instances() { return lent_->instances; }
 
-  // What the plug-in holds of the host, and what it did wrong, a line each; empty when all is in
-  // order. Whole after Stop.
+  // What plug-ins hold of the process's hosts, and what they did wrong, a line each; empty when all
+  // is in order. Whole after Stop of the only one.
   std::string LeakReport() const;
 
   // -- For the other half of the library --
@@ -83,25 +84,10 @@ class Host {
   CommandResult Command(std::uint32_t command, HX_InData& in, HX_OutData& out,
                         HX_ParamDef* params[] = nullptr, HX_World* output = nullptr,
                         void* extra = nullptr);
-  // Ends a wait, or the next one. Any thread; cheap, and many count as one.
-  void Wake();
-  // True when it was woken.
-  bool WaitForWake(std::chrono::milliseconds time);
-  // While one lives on a thread, Wake does nothing there: what a command asks for on the loop's own
-  // thread is seen to without.
-  class LoopCall {
-   public:
-    LoopCall();
-    ~LoopCall();
-    LoopCall(const LoopCall&) = delete;
-    LoopCall& operator=(const LoopCall&) = delete;
-  };
+  const std::shared_ptr<LoopWake>& wake() const { return wake_; }
 
   // -- For the interface's functions --
   HX_Err AddParam(std::int32_t index, const HX_ParamDef& param);
-  std::uint64_t OpenStrings(const HX_StringTable& table);
-  const char* GetString(std::uint64_t token, std::int32_t index) const;
-  void CloseStrings(std::uint64_t token);
   void CountParamCheckout(int change) { param_checkouts_ += change; }
   void CountDirectRender(int change) { direct_renders_ += change; }
 
@@ -109,7 +95,7 @@ class Host {
   void Start();
   void DeclareParams();
 
-  // Sets the debug option while it lives, where it is wanted and not set.
+  // Has the debug option set while one that wants it lives, where it was not.
   class ExperimentalParameters {
    public:
     explicit ExperimentalParameters(bool wanted);
@@ -118,35 +104,36 @@ class Host {
     ExperimentalParameters& operator=(const ExperimentalParameters&) = delete;
 
    private:
-    const bool sets_;
+    const bool wanted_;
+  };
+  // Counts the hosts that run. The last that leaves ends the plug-ins' background tasks.
+  class Running {
+   public:
+    explicit Running(Host& host);
+    ~Running();
+    Running(const Running&) = delete;
+    Running& operator=(const Running&) = delete;
+
+   private:
+    Host& host_;
   };
 
   const HostSettings settings_;
   std::atomic<bool> keeps_analysis_raw_;
   const ExperimentalParameters experimental_;
-  PluginLibrary library_;
+  std::list<PluginLibrary> library_;  // one; it goes on to others without memory
+  const SharedByAll<Lent> lent_;
   MediaServices media_;
   UserInterface user_interface_;
-  HandleStore handles_;
-  OpaqueStore opaque_data_;
-  WorldStore worlds_;
-  InstanceRegistry instances_;
+  const std::shared_ptr<LoopWake> wake_ = std::make_shared<LoopWake>();
 
   std::vector<HX_ParamDef> declarations_;  // constant after construction
   bool declaring_ = false;
   std::uint32_t version_ = 0, out_flags_ = 0, out_flags2_ = 0;  // constant after construction
   std::atomic<HX_Handle> global_data_{nullptr};
-  bool running_ = false;
-
-  mutable std::mutex strings_mutex_;
-  std::map<std::uint64_t, std::unique_ptr<tessel::config::StringTable>> strings_;  // guarded by it
-  std::uint64_t last_token_ = 0;                                                   // guarded by it
-
+  bool started_ = false;
   std::atomic<std::int64_t> param_checkouts_{0}, direct_renders_{0};
-
-  std::mutex wake_mutex_;
-  std::condition_variable woken_changed_;
-  bool woken_ = false;  // guarded by wake_mutex_
+  std::optional<Running> running_;  // last
 };
 
 }  // namespace calmframe::host

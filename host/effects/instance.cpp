@@ -25,12 +25,12 @@ std::shared_ptr<Instance> Instance::Make(Host& host, std::shared_ptr<TimelineEff
 }
 
 Instance::Instance(Host& host, std::shared_ptr<TimelineEffect> effect)
-    : host_(host), effect_(std::move(effect)) {}
+    : host_(host), wake_(host.wake()), effect_(std::move(effect)) {}
 
 Instance::~Instance() {
   if (!ref_) return;
-  host_.instances().Remove(ref_);
-  host_.media().DetachEffect(ref_);
+  if (Lent* lent = Lent::active()) lent->instances.Remove(ref_);
+  MediaServices::DetachEffect(ref_);
 }
 
 // From here on nothing needs memory: the plug-in takes everything apart on this way too.

@@ -7,6 +7,7 @@
 #include <optional>
 #include <string>
 
+#include "host/effects/loop_wake.h"
 #include "host/effects/render_context.h"
 #include "host/effects/timeline_effect.h"
 #include "platform/hx/hx_effect.h"
@@ -39,6 +40,9 @@ class Instance {
 
   const std::shared_ptr<TimelineEffect>& effect() const { return effect_; }
   HX_EffectRef ref() const { return ref_; }
+  // For calls on the threads of commands: on others the host may be gone.
+  Host& host() const { return host_; }
+  LoopWake& wake() const { return *wake_; }
   HX_Handle handle() const { return handle_; }
   void SetHandle(HX_Handle handle) { handle_ = handle; }
 
@@ -81,6 +85,7 @@ class Instance {
   void SetLayerOfCall(boost::shared_ptr<const LayerState> layer);
 
   Host& host_;
+  const std::shared_ptr<LoopWake> wake_;
   const std::shared_ptr<TimelineEffect> effect_;
   HX_EffectRef ref_ = nullptr;  // constant after Make
   HX_Handle handle_ = nullptr;

@@ -9,13 +9,12 @@
 // What every C function of the interface does first and last.
 namespace calmframe::host {
 
-// body(host) behind the operation's fault switch; what it throws becomes a code.
+// body() behind the operation's fault switch; what it throws becomes a code.
 template <typename Body>
-HX_Err WithHost(const char* operation, Body body) noexcept {
+HX_Err Guarded(const char* operation, Body body) noexcept {
   try {
     if (const HX_Err code = BeginOperation(operation)) return code;
-    Host* host = Host::active();
-    return host ? body(*host) : HX_ERR_UNKNOWN;
+    return body();
   } catch (const std::bad_alloc&) {
     return HX_ERR_MEMORY;
   } catch (...) {
@@ -23,12 +22,36 @@ HX_Err WithHost(const char* operation, Body body) noexcept {
   }
 }
 
-// body(host, instance); an error for an effect that is no more.
+// body(host) of the calling host; for what is asked on the loop's thread alone.
+template <typename Body>
+HX_Err WithHost(const char* operation, Body body) noexcept {
+  return Guarded(operation, [&]() -> HX_Err {
+    Host* host = Host::calling();
+    return host ? body(*host) : HX_ERR_UNKNOWN;
+  });
+}
+
+// body(lent).
+template <typename Body>
+HX_Err WithLent(const char* operation, Body body) noexcept {
+  return Guarded(operation, [&]() -> HX_Err {
+    Lent* lent = Lent::active();
+    return lent ? body(*lent) : HX_ERR_UNKNOWN;
+  });
+}
+
+// Null for an effect that is no more.
+inline std::shared_ptr<Instance> FindInstance(HX_EffectRef effect) {
+  Lent* lent = Lent::active();
+  return lent ? lent->instances.Find(effect) : nullptr;
+}
+
+// body(instance); an error for an effect that is no more.
 template <typename Body>
 HX_Err WithInstance(const char* operation, HX_EffectRef effect, Body body) noexcept {
-  return WithHost(operation, [&](Host& host) -> HX_Err {
-    const std::shared_ptr<Instance> instance = host.instances().Find(effect);
-    return instance ? body(host, *instance) : HX_ERR_UNKNOWN;
+  return Guarded(operation, [&]() -> HX_Err {
+    const std::shared_ptr<Instance> instance = FindInstance(effect);
+    return instance ? body(*instance) : HX_ERR_UNKNOWN;
   });
 }
 

@@ -7,7 +7,8 @@
 
 namespace calmframe::host {
 
-// The interface's C functions; they work on Host::active(). Every one that can fail passes through
+// The interface's C functions. What they work on is found by the effect, or by what was lent, or is
+// the host's whose command runs (Host::calling). Every one that can fail passes through
 // Operations::Begin, and no exception leaves them.
 const HX_Callbacks& Callbacks();
 const HX_BasicSuite& BasicSuite();

@@ -8,7 +8,7 @@ namespace {
 // body(frames); an error outside of a render.
 template <typename Body>
 HX_Err WithFrames(const char* operation, HX_EffectRef effect, Body body) noexcept {
-  return WithInstance(operation, effect, [&](Host&, Instance& instance) -> HX_Err {
+  return WithInstance(operation, effect, [&](Instance& instance) -> HX_Err {
     return instance.frames() ? body(*instance.frames()) : HX_ERR_UNKNOWN;
   });
 }
@@ -30,8 +30,7 @@ HX_Err CheckoutLayerPixels(HX_EffectRef effect, std::int32_t id, HX_World** worl
 
 // Not to be failed, as every giving back.
 HX_Err CheckinLayerPixels(HX_EffectRef effect, std::int32_t id) {
-  Host* host = Host::active();
-  const std::shared_ptr<Instance> instance = host ? host->instances().Find(effect) : nullptr;
+  const std::shared_ptr<Instance> instance = FindInstance(effect);
   return instance && instance->frames() ? instance->frames()->CheckInOrdered(id) : HX_ERR_UNKNOWN;
 }
 

@@ -105,7 +105,7 @@ Session::Wait Session::TickUntilSettled(std::chrono::milliseconds timeout,
           })) {
         return Wait::settled;
       }
-      host_.WaitForWake(kTickPeriod);
+      host_.wake()->Wait(kTickPeriod);
       const auto spent =
           std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - begin);
       if (spent < kShortestPeriod) std::this_thread::sleep_for(kShortestPeriod - spent);
@@ -119,7 +119,7 @@ void Session::Post(std::function<void()> task) {
     std::lock_guard lock(posted_mutex_);
     posted_.push_back(std::move(task));
   }
-  host_.Wake();
+  host_.wake()->Wake();
 }
 
 void Session::PauseBackgroundWork(bool pause) {

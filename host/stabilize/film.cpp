@@ -169,7 +169,7 @@ SteadyClip* Film::Next() {
   if (shot_) {
     next_ = shot_->range().end;
     ++number_;
-    shot_.reset();  // ahead of the next: one host at a time
+    shot_.reset();  // ahead of the next: a film takes the memory of one shot
   }
   if (next_ >= range_.end) return nullptr;
   if (number_ < saved_.shots.size()) return Open(number_);

@@ -64,8 +64,8 @@ ClipMedium OpenMedium(const std::string& path, Opening opening,
 ClipMedium StandInFor(const Project& project);
 
 // A clip, or a shot of one, on the timeline of a host, with the effect applied to it: worked,
-// framed, measured and saved. For the thread that made it; one at a time in a process, as its host
-// is.
+// framed, measured and saved. For the thread that made it; others of the process have nothing to do
+// with it.
 class SteadyClip {
  public:
   // `plugin`: the effect's library. These frames of a clip, of which nothing is done yet, or as far

@@ -11,15 +11,35 @@ namespace calmframe::host {
 
 using tessel::utility::Guid;
 
-Guid IdentifierOf(const FrameRequest& request) {
+namespace {
+
+constexpr std::size_t kNumberBytes = 4;
+
+}  // namespace
+
+Guid IdentifierOf(const FrameRequest& request, std::uint32_t number) {
   const std::int64_t parts[] = {request.picture.frame, request.picture.parity,
                                 static_cast<std::int64_t>(request.kind), request.width,
                                 request.height};
-  return tessel::utility::MixHash(IdentityOf(request.node), parts, sizeof parts);
+  Guid::Bytes bytes =
+      tessel::utility::MixHash(IdentityOf(request.node), parts, sizeof parts).bytes();
+  for (std::size_t i = 0; i < kNumberBytes; ++i) {
+    bytes[bytes.size() - kNumberBytes + i] = static_cast<std::uint8_t>(number >> (8 * i));
+  }
+  return Guid(bytes);
+}
+
+std::uint32_t NumberOf(const Guid& identifier) {
+  const Guid::Bytes& bytes = identifier.bytes();
+  std::uint32_t number = 0;
+  for (std::size_t i = 0; i < kNumberBytes; ++i) {
+    number |= std::uint32_t{bytes[bytes.size() - kNumberBytes + i]} << (8 * i);
+  }
+  return number;
 }
 
 PicturePtr FrameMaker::Get(const FrameRequest& request, const FrameLayout& layout) {
-  const Guid identifier = IdentifierOf(request);
+  const Guid identifier = Identifier(request);
   std::unique_lock lock(mutex_);
   if (const PicturePtr cached = cache_.Find(identifier)) return cached;
   if (const auto under_way = makings_.find(identifier); under_way != makings_.end()) {

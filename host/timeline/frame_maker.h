@@ -3,6 +3,7 @@
 #include <boost/shared_ptr.hpp>
 #include <condition_variable>
 #include <cstddef>
+#include <cstdint>
 #include <map>
 #include <mutex>
 #include <string>
@@ -20,8 +21,10 @@ struct FrameRequest {
   int width = 0, height = 0;
 };
 
-// Names the frame: equal for equal requests, in every process.
-tessel::utility::Guid IdentifierOf(const FrameRequest& request);
+// Names the frame, and in its last four bytes whose it is, the lowest first: equal for equal
+// requests and numbers, in every process.
+tessel::utility::Guid IdentifierOf(const FrameRequest& request, std::uint32_t number);
+std::uint32_t NumberOf(const tessel::utility::Guid& identifier);
 
 // How a new frame lies in memory.
 struct FrameLayout {
@@ -33,7 +36,14 @@ struct FrameLayout {
 // at the same time get it from one making.
 class FrameMaker {
  public:
-  explicit FrameMaker(FrameCache& cache) : cache_(cache), pool_(PicturePool::Make()) {}
+  // `number`: of the identifiers of its frames.
+  FrameMaker(FrameCache& cache, std::uint32_t number)
+      : number_(number), cache_(cache), pool_(PicturePool::Make()) {}
+
+  // Under which the frame stands in the cache.
+  tessel::utility::Guid Identifier(const FrameRequest& request) const {
+    return IdentifierOf(request, number_);
+  }
 
   // From the cache, else made on this thread. Null where the media has no such frame, and on a
   // failure; std::bad_alloc without memory.
@@ -52,6 +62,7 @@ class FrameMaker {
   PicturePtr Make(const FrameRequest& request, const FrameLayout& layout);
   void Keep(const char* line) noexcept;
 
+  const std::uint32_t number_;
   FrameCache& cache_;
   const boost::shared_ptr<PicturePool> pool_;
   mutable std::mutex mutex_;

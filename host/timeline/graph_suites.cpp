@@ -6,25 +6,26 @@
 namespace calmframe::host {
 namespace {
 
-using Core = MediaCore;
+using Tables = MediaTables;
+using Node = MediaTables::Placed<GraphNode>;
 
 HX_Err AcquireSegments(HX_EffectRef effect, HX_Segments* segments) {
-  return Operation("Sequence Info.AcquireSegments", [=](Core& core) {
-    const auto attached = core.Find(effect);
+  return Operation("Sequence Info.AcquireSegments", [=](Tables& tables) {
+    const auto attached = tables.Find(effect);
     if (!attached || !segments) return HX_ERR_UNKNOWN;
-    *segments = core.segments.Add(attached->layer->state());
+    *segments = tables.segments.Add({attached->layer->state(), attached->core});
     return HX_ERR_NONE;
   });
 }
 
 HX_Err ReleaseSegments(HX_Segments segments) {
   return GivingBack("Sequence Info.ReleaseSegments",
-                    [=](Core& core) { return core.segments.Remove(segments); });
+                    [=](Tables& tables) { return tables.segments.Remove(segments); });
 }
 
 HX_Err GetTicksPerFrame(HX_EffectRef effect, int64_t* ticks) {
-  return Operation("Sequence Info.GetTicksPerFrame", [=](Core& core) {
-    const auto attached = core.Find(effect);
+  return Operation("Sequence Info.GetTicksPerFrame", [=](Tables& tables) {
+    const auto attached = tables.Find(effect);
     if (!attached || !ticks) return HX_ERR_UNKNOWN;
     *ticks = attached->layer->state()->ticks_per_frame;
     return HX_ERR_NONE;
@@ -32,11 +33,11 @@ HX_Err GetTicksPerFrame(HX_EffectRef effect, int64_t* ticks) {
 }
 
 HX_Err GetSegmentNodeAt(HX_Segments segments, int64_t ticks, HX_Node* node) {
-  return Operation("Video Segment.GetSegmentNodeAt", [=](Core& core) {
-    return WithHandle(core.segments, segments, [&](const auto& layer) {
-      const auto found = NodeAt(layer, ticks);
-      if (!found || !node || core.faults.node_missing) return HX_ERR_UNKNOWN;
-      *node = core.nodes.Add(*found);
+  return Operation("Video Segment.GetSegmentNodeAt", [=](Tables& tables) {
+    return WithHandle(tables.segments, segments, [&](const auto& layer) {
+      const auto found = NodeAt(layer.value, ticks);
+      if (!found || !node || layer.core->faults.node_missing) return HX_ERR_UNKNOWN;
+      *node = tables.nodes.Add({*found, layer.core});
       return HX_ERR_NONE;
     });
   });
@@ -48,21 +49,22 @@ int OperatorCount(const GraphNode& node) {
 }
 
 HX_Err Count(HX_Node node, int32_t* count, const char* name) {
-  return Operation(name, [=](Core& core) {
-    return WithHandle(core.nodes, node, [&](const GraphNode& found) {
+  return Operation(name, [=](Tables& tables) {
+    return WithHandle(tables.nodes, node, [&](const Node& found) {
       if (!count) return HX_ERR_UNKNOWN;
-      *count = OperatorCount(found);
+      *count = OperatorCount(found.value);
       return HX_ERR_NONE;
     });
   });
 }
 
 HX_Err Child(HX_Node node, int32_t index, bool is_operator, HX_Node* child, const char* name) {
-  return Operation(name, [=](Core& core) {
-    return WithHandle(core.nodes, node, [&](const GraphNode& found) {
+  return Operation(name, [=](Tables& tables) {
+    return WithHandle(tables.nodes, node, [&](const Node& parent) {
+      const GraphNode& found = parent.value;
       if (index < 0 || index >= OperatorCount(found) || !child) return HX_ERR_UNKNOWN;
-      *child =
-          core.nodes.Add({found.layer, is_operator ? found.level : found.level - 1, is_operator});
+      *child = tables.nodes.Add(
+          {{found.layer, is_operator ? found.level : found.level - 1, is_operator}, parent.core});
       return HX_ERR_NONE;
     });
   });
@@ -85,23 +87,23 @@ HX_Err GetInput(HX_Node node, int32_t index, HX_Node* input) {
 }
 
 HX_Err GetProperty(HX_Node node, const char* key, HX_String* text) {
-  return Operation("Video Segment.GetProperty", [=](Core& core) {
-    return WithHandle(core.nodes, node, [&](const GraphNode& found) {
+  return Operation("Video Segment.GetProperty", [=](Tables& tables) {
+    return WithHandle(tables.nodes, node, [&](const Node& found) {
       if (!key || !text) return HX_ERR_UNKNOWN;
-      if (core.faults.property_missing && !found.is_operator) return HX_ERR_UNKNOWN;
-      const std::string value = PropertyOf(found, key);
+      if (found.core->faults.property_missing && !found.value.is_operator) return HX_ERR_UNKNOWN;
+      const std::string value = PropertyOf(found.value, key);
       if (value.empty()) return HX_ERR_UNKNOWN;
-      *text = core.strings.Make(value);
+      *text = tables.strings.Make(value);
       return HX_ERR_NONE;
     });
   });
 }
 
 HX_Err GetNodeGuid(HX_Node node, HX_Guid* guid) {
-  return Operation("Video Segment.GetNodeGuid", [=](Core& core) {
-    return WithHandle(core.nodes, node, [&](const GraphNode& found) {
-      if (found.is_operator || !guid) return HX_ERR_UNKNOWN;
-      const auto bytes = IdentityOf(found).bytes();
+  return Operation("Video Segment.GetNodeGuid", [=](Tables& tables) {
+    return WithHandle(tables.nodes, node, [&](const Node& found) {
+      if (found.value.is_operator || !guid) return HX_ERR_UNKNOWN;
+      const auto bytes = IdentityOf(found.value).bytes();
       std::copy(bytes.begin(), bytes.end(), guid->bytes);
       return HX_ERR_NONE;
     });
@@ -109,10 +111,10 @@ HX_Err GetNodeGuid(HX_Node node, HX_Guid* guid) {
 }
 
 HX_Err GetOperatorText(HX_Node effect_operator, HX_String* text) {
-  return Operation("Video Segment.GetOperatorText", [=](Core& core) {
-    return WithHandle(core.nodes, effect_operator, [&](const GraphNode& found) {
-      if (!found.is_operator || !text) return HX_ERR_UNKNOWN;
-      *text = core.strings.Make(IdentityOf(found).ToText());
+  return Operation("Video Segment.GetOperatorText", [=](Tables& tables) {
+    return WithHandle(tables.nodes, effect_operator, [&](const Node& found) {
+      if (!found.value.is_operator || !text) return HX_ERR_UNKNOWN;
+      *text = tables.strings.Make(IdentityOf(found.value).ToText());
       return HX_ERR_NONE;
     });
   });
@@ -120,7 +122,7 @@ HX_Err GetOperatorText(HX_Node effect_operator, HX_String* text) {
 
 HX_Err ReleaseNode(HX_Node node) {
   return GivingBack("Video Segment.ReleaseNode",
-                    [=](Core& core) { return core.nodes.Remove(node); });
+                    [=](Tables& tables) { return tables.nodes.Remove(node); });
 }
 
 }  // namespace

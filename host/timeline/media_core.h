@@ -2,14 +2,17 @@
 
 #include <atomic>
 #include <boost/shared_ptr.hpp>
+#include <boost/weak_ptr.hpp>
 #include <cstdint>
 #include <map>
 #include <mutex>
 #include <new>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "host/base/operations.h"
+#include "host/base/shared_by_all.h"
 #include "host/timeline/frame_cache.h"
 #include "host/timeline/frame_maker.h"
 #include "host/timeline/handle_table.h"
@@ -19,48 +22,66 @@
 
 namespace calmframe::host {
 
-// What the operations of the suites work on.
+// What one MediaServices works with. Nodes and effects that were lent keep it.
 class MediaCore {
  public:
+  // `number`: tells it from the others that live; in the identifiers of its frames.
+  MediaCore(const MediaSettings& settings, std::uint32_t number);
+
+  MediaFaults faults;
+  FrameCache cache;
+  FrameMaker maker;
+  std::atomic<std::uint64_t> delivered{0};  // see MediaCounts
+  RenderQueue queue;                        // last: its threads use all of the above
+};
+
+using MediaCorePtr = boost::shared_ptr<MediaCore>;
+
+// What all MediaServices of the process have lent, since the suites' functions don't tell of which
+// they ask: what stands under a handle does. Any thread.
+class MediaTables {
+ public:
+  // Something of a layer, and where its frames are made.
+  template <class Value>
+  struct Placed {
+    Value value;
+    MediaCorePtr core;
+  };
   struct Attached {
     boost::shared_ptr<Layer> layer;
     std::uint32_t runtime_id = 0;
+    MediaCorePtr core;
   };
-
-  MediaCore(const MediaSettings& settings, const MediaFaults& fault_switches);
-
-  // That of the active services; null when there are none.
-  static MediaCore* active();
 
   std::optional<Attached> Find(HX_EffectRef effect) const;
   void Attach(HX_EffectRef effect, Attached attached);
   void Detach(HX_EffectRef effect);
 
-  const MediaFaults& faults;
-  FrameCache cache;
-  FrameMaker maker;
-  HandleTable<HX_Node, GraphNode> nodes;
-  HandleTable<HX_Segments, boost::shared_ptr<const LayerState>> segments;
+  // Has the lowest number that is free, from 0.
+  MediaCorePtr NewCore(const MediaSettings& settings);
+  // Null where there is none of that number any more.
+  MediaCorePtr CoreOf(std::uint32_t number) const;
+  std::vector<MediaCorePtr> Cores() const;
+
+  HandleTable<HX_Node, Placed<GraphNode>> nodes;
+  HandleTable<HX_Segments, Placed<boost::shared_ptr<const LayerState>>> segments;
   HandleTable<HX_Frame, PicturePtr> frames;
   StringTable strings;
-  std::atomic<std::uint64_t> delivered{0};  // see MediaCounts
 
  private:
   mutable std::mutex mutex_;
-  std::map<HX_EffectRef, Attached> effects_;  // guarded by mutex_
-
- public:
-  RenderQueue queue;  // last: its threads use all of the above
+  std::map<HX_EffectRef, Attached> effects_;                       // guarded by mutex_
+  std::map<std::uint32_t, boost::weak_ptr<MediaCore>> by_number_;  // guarded by mutex_
 };
 
 // An operation of a suite, by the name that Operations knows: unless it is to fail, the body, which
-// gets the core and returns a code. Nothing is thrown to the caller.
+// gets the tables and returns a code. Nothing is thrown to the caller.
 template <class Body>
 HX_Err Operation(const char* name, Body body) noexcept {
   try {
     if (const HX_Err code = BeginOperation(name)) return code;
-    MediaCore* const core = MediaCore::active();
-    return core ? body(*core) : HX_ERR_UNKNOWN;
+    MediaTables* const tables = SharedByAll<MediaTables>::active();
+    return tables ? body(*tables) : HX_ERR_UNKNOWN;
   } catch (const std::bad_alloc&) {
     return HX_ERR_MEMORY;
   } catch (...) {
@@ -74,9 +95,9 @@ template <class Body>
 HX_Err GivingBack(const char* name, Body body) noexcept {
   try {
     const HX_Err code = BeginOperation(name);
-    MediaCore* const core = MediaCore::active();
-    if (!core) return HX_ERR_UNKNOWN;
-    if (!body(*core)) {
+    MediaTables* const tables = SharedByAll<MediaTables>::active();
+    if (!tables) return HX_ERR_UNKNOWN;
+    if (!body(*tables)) {
       Ledger::Get().Mistake(name, " of what is not lent");
       return HX_ERR_UNKNOWN;
     }

@@ -1,42 +1,31 @@
 #include "host/timeline/media_services.h"
 
 #include <algorithm>
-#include <stdexcept>
+#include <boost/make_shared.hpp>
 #include <utility>
 
 #include "host/timeline/media_core.h"
 
 namespace calmframe::host {
-namespace {
 
-std::atomic<MediaServices*> active_services = nullptr;
-
-}  // namespace
-
-MediaCore::MediaCore(const MediaSettings& settings, const MediaFaults& fault_switches)
-    : faults(fault_switches),
-      cache(settings.cache_bytes),
-      maker(cache),
+MediaCore::MediaCore(const MediaSettings& settings, std::uint32_t number)
+    : cache(settings.cache_bytes),
+      maker(cache, number),
       queue(std::max(settings.render_threads, 2)) {}
 
-MediaCore* MediaCore::active() {
-  MediaServices* const services = MediaServices::active();
-  return services ? services->core_.get() : nullptr;
-}
-
-std::optional<MediaCore::Attached> MediaCore::Find(HX_EffectRef effect) const {
+std::optional<MediaTables::Attached> MediaTables::Find(HX_EffectRef effect) const {
   std::lock_guard lock(mutex_);
   const auto found = effects_.find(effect);
   if (found == effects_.end()) return std::nullopt;
   return found->second;
 }
 
-void MediaCore::Attach(HX_EffectRef effect, Attached attached) {
+void MediaTables::Attach(HX_EffectRef effect, Attached attached) {
   std::lock_guard lock(mutex_);
   std::swap(effects_[effect], attached);
 }
 
-void MediaCore::Detach(HX_EffectRef effect) {
+void MediaTables::Detach(HX_EffectRef effect) {
   Attached gone;
   std::lock_guard lock(mutex_);
   const auto found = effects_.find(effect);
@@ -45,24 +34,43 @@ void MediaCore::Detach(HX_EffectRef effect) {
   effects_.erase(found);
 }
 
-MediaServices::MediaServices(const MediaSettings& settings)
-    : core_(std::make_unique<MediaCore>(settings, faults)) {
-  MediaServices* none = nullptr;
-  if (!active_services.compare_exchange_strong(none, this)) {
-    throw std::logic_error("the media services of a process are active already");
-  }
+MediaCorePtr MediaTables::NewCore(const MediaSettings& settings) {
+  std::lock_guard lock(mutex_);
+  std::erase_if(by_number_, [](const auto& entry) { return entry.second.expired(); });
+  std::uint32_t number = 0;
+  while (by_number_.count(number) != 0) ++number;
+  const auto core = boost::make_shared<MediaCore>(settings, number);
+  by_number_.emplace(number, core);
+  return core;
 }
+
+MediaCorePtr MediaTables::CoreOf(std::uint32_t number) const {
+  std::lock_guard lock(mutex_);
+  const auto found = by_number_.find(number);
+  return found == by_number_.end() ? nullptr : found->second.lock();
+}
+
+std::vector<MediaCorePtr> MediaTables::Cores() const {
+  std::vector<MediaCorePtr> cores;
+  std::lock_guard lock(mutex_);
+  for (const auto& [number, weak] : by_number_) {
+    if (MediaCorePtr core = weak.lock()) cores.push_back(std::move(core));
+  }
+  return cores;
+}
+
+struct MediaServices::Share : SharedByAll<MediaTables> {};
+
+MediaServices::MediaServices(const MediaSettings& settings)
+    : tables_(std::make_unique<Share>()),
+      core_((*tables_)->NewCore(settings)),
+      faults(core_->faults) {}
 
 MediaServices::~MediaServices() {
   Shutdown();
-  active_services = nullptr;
 }
 
-MediaServices* MediaServices::active() {
-  return active_services;
-}
-
-const void* MediaServices::FindSuite(std::string_view name, std::int32_t version) const {
+const void* MediaServices::FindSuite(std::string_view name, std::int32_t version) {
   const struct {
     const char* name;
     std::int32_t version;
@@ -85,15 +93,15 @@ const void* MediaServices::FindSuite(std::string_view name, std::int32_t version
 
 void MediaServices::AttachEffect(HX_EffectRef effect, boost::shared_ptr<Layer> layer,
                                  std::uint32_t runtime_id) {
-  core_->Attach(effect, {std::move(layer), runtime_id});
+  (*tables_)->Attach(effect, {std::move(layer), runtime_id, core_});
 }
 
 void MediaServices::DetachEffect(HX_EffectRef effect) {
-  core_->Detach(effect);
+  if (MediaTables* const tables = SharedByAll<MediaTables>::active()) tables->Detach(effect);
 }
 
 PicturePtr MediaServices::Input(HX_EffectRef effect, const InputRequest& request) {
-  const auto attached = core_->Find(effect);
+  const auto attached = (*tables_)->Find(effect);
   if (!attached) return nullptr;
   const boost::shared_ptr<const LayerState> layer =
       request.layer ? request.layer : attached->layer->state();
@@ -117,11 +125,12 @@ void MediaServices::Shutdown() {
 }
 
 MediaCounts MediaServices::counts() const {
+  const MediaTables& tables = **tables_;
   MediaCounts counts;
-  counts.nodes = core_->nodes.size();
-  counts.segments = core_->segments.size();
-  counts.strings = core_->strings.size();
-  counts.frames = core_->frames.size();
+  counts.nodes = tables.nodes.size();
+  counts.segments = tables.segments.size();
+  counts.strings = tables.strings.size();
+  counts.frames = tables.frames.size();
   counts.references = core_->cache.references();
   counts.requests = core_->queue.outstanding();
   counts.cached_bytes = core_->cache.bytes();

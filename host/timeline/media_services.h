@@ -35,7 +35,7 @@ struct MediaSettings {
   int render_threads = 2;  // at least 2 are made
 };
 
-// What is lent or under way.
+// What is lent or under way; the first four by all services of the process.
 struct MediaCounts {
   std::size_t nodes = 0;  // references to nodes and operators
   std::size_t segments = 0;
@@ -58,10 +58,11 @@ struct InputRequest {
 
 class MediaCore;  // what the operations of the suites work on
 
-// Media, node graph, frame cache and asynchronous rendering of one host process: the suites
+// Media, node graph, frame cache and asynchronous rendering of one host: the suites
 // "Rushbase Sequence Info Suite", "Rushbase Video Segment Suite", "Rushbase Video Segment Render
-// Suite", "Cutline CutPix Suite", "Cutline CutPix Cache Suite" and "Rushbase StringSuite". One at a
-// time in a process. Any thread, but for construction and destruction.
+// Suite", "Cutline CutPix Suite", "Cutline CutPix Cache Suite" and "Rushbase StringSuite". Several
+// in a process have nothing in common: each serves its own effects, with its own frames and
+// threads, whatever is equal in their media. Any thread, but for construction and destruction.
 class MediaServices {
  public:
   explicit MediaServices(const MediaSettings& settings = {});
@@ -69,16 +70,15 @@ class MediaServices {
   MediaServices(const MediaServices&) = delete;
   MediaServices& operator=(const MediaServices&) = delete;
 
-  static MediaServices* active();  // null when there is none
-
   // Table of a suite; null for one that is not of this half of the host.
-  const void* FindSuite(std::string_view name, std::int32_t version) const;
+  static const void* FindSuite(std::string_view name, std::int32_t version);
 
   // Puts the effect on the layer. Its operator must stand in the layer's chain, under this id,
   // for its nodes to be found. Attached anew, an effect changes over to the other layer.
   void AttachEffect(HX_EffectRef effect, boost::shared_ptr<Layer> layer, std::uint32_t runtime_id);
   // Nodes that were given and renders under way stay valid; the suites then refuse the effect.
-  void DetachEffect(HX_EffectRef effect);
+  // Also when its services are gone.
+  static void DetachEffect(HX_EffectRef effect);
 
   // What enters the effect at a time, scaled if asked; from the cache, else made on this thread.
   // Null where the media has no frame and when it can't be read (see failure).
@@ -95,11 +95,13 @@ class MediaServices {
   // The bound of MediaSettings, from now on.
   void SetCacheBytes(std::size_t bytes);
 
-  MediaFaults faults;
-
  private:
-  friend class MediaCore;
-  std::unique_ptr<MediaCore> core_;
+  struct Share;  // of what all services have lent
+  const std::unique_ptr<Share> tables_;
+  const boost::shared_ptr<MediaCore> core_;
+
+ public:
+  MediaFaults& faults;
 };
 
 }  // namespace calmframe::host

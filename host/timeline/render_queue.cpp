@@ -1,6 +1,7 @@
 #include "host/timeline/render_queue.h"
 
 #include <algorithm>
+#include <atomic>
 #include <limits>
 #include <utility>
 
@@ -8,6 +9,16 @@ namespace calmframe::host {
 namespace {
 
 thread_local const RenderQueue* own_queue = nullptr;
+
+// The next number; 0 when they are used up.
+std::int32_t NewId() {
+  static std::atomic<std::int32_t> last{0};
+  std::int32_t id = last.load();
+  do {
+    if (id == std::numeric_limits<std::int32_t>::max()) return 0;
+  } while (!last.compare_exchange_weak(id, id + 1));
+  return id + 1;
+}
 
 }  // namespace
 
@@ -29,10 +40,10 @@ std::int32_t RenderQueue::Post(Request request) {
   std::int32_t id = 0;
   {
     std::lock_guard lock(mutex_);
-    if (closed_ || last_id_ == std::numeric_limits<std::int32_t>::max()) return 0;
-    id = last_id_ + 1;
+    if (closed_) return 0;
+    id = NewId();
+    if (id == 0) return 0;
     waiting_.emplace_hint(waiting_.end(), id, std::move(request));
-    last_id_ = id;
   }
   changed_.notify_one();
   return id;

@@ -26,7 +26,7 @@ class RenderQueue {
   RenderQueue(const RenderQueue&) = delete;
   RenderQueue& operator=(const RenderQueue&) = delete;
 
-  // A number from 1 on that is never used again; 0: closed, nothing will run.
+  // A number from 1 on that no queue of the process uses again; 0: closed, nothing will run.
   std::int32_t Post(Request request);
   // A request that hasn't begun runs as a cancelled one, `delay` from now or when the queue closes.
   // Numbers of others are ignored.
@@ -46,7 +46,6 @@ class RenderQueue {
   mutable std::mutex mutex_;  // guards all below but threads_
   std::condition_variable changed_;
   bool closed_ = false;
-  std::int32_t last_id_ = 0;
   std::size_t running_ = 0;
   std::map<std::int32_t, Request> waiting_;              // in the order of posting
   std::multimap<Clock::time_point, Request> cancelled_;  // by the time to tell

@@ -8,7 +8,9 @@
 namespace calmframe::host {
 namespace {
 
-using Core = MediaCore;
+using tessel::utility::Guid;
+using Tables = MediaTables;
+using Node = MediaTables::Placed<GraphNode>;
 
 // Width, height and depth that count are those of the params; a frame is the same whatever the rest
 // says.
@@ -28,14 +30,14 @@ std::optional<FrameRequest> RequestOf(const GraphNode& node, std::int64_t time_t
 }
 
 // A handle of the frame; 0 when there is none.
-HX_Frame MakeFrame(Core& core, const FrameRequest& request) noexcept {
+HX_Frame MakeFrame(Tables& tables, MediaCore& core, const FrameRequest& request) noexcept {
   try {
     if (core.faults.null_frame) return 0;
     const FrameLayout layout{core.faults.row_padding, !core.faults.bottom_up};
     const PicturePtr picture = core.maker.Get(request, layout);
     if (!picture) return 0;
     ++core.delivered;
-    return core.frames.Add(picture);
+    return tables.frames.Add(picture);
   } catch (const std::exception&) {
     return 0;
   }
@@ -44,15 +46,16 @@ HX_Frame MakeFrame(Core& core, const FrameRequest& request) noexcept {
 HX_Err RenderAsync(HX_Node node, int64_t time_ticks, int64_t /*rate_ticks*/,
                    const HX_RenderParams* params, HX_RenderCallback callback, void* record,
                    int32_t* request_id) {
-  return Operation("Video Segment Render.RenderAsync", [=](Core& core) {
-    return WithHandle(core.nodes, node, [&](const GraphNode& found) {
-      const std::optional<FrameRequest> request = RequestOf(found, time_ticks, params);
+  return Operation("Video Segment Render.RenderAsync", [=](Tables& tables) {
+    return WithHandle(tables.nodes, node, [&](const Node& found) {
+      const std::optional<FrameRequest> request = RequestOf(found.value, time_ticks, params);
+      MediaCore& core = *found.core;
       if (!request || !callback || !request_id || core.faults.render_refused) {
         return HX_ERR_UNKNOWN;
       }
       const auto called = boost::make_shared<tessel::threads::CompletionEvent>();
-      const std::int32_t id = core.queue.Post([=, &core](bool cancelled) {
-        callback(cancelled ? 0 : MakeFrame(core, *request), record);
+      const std::int32_t id = core.queue.Post([=, &tables, &core](bool cancelled) {
+        callback(cancelled ? 0 : MakeFrame(tables, core, *request), record);
         called->Signal();
       });
       if (id == 0) return HX_ERR_UNKNOWN;
@@ -67,27 +70,29 @@ HX_Err RenderAsync(HX_Node node, int64_t time_ticks, int64_t /*rate_ticks*/,
 HX_Err MakeIdentifier(HX_Node node, int64_t time_ticks, int64_t /*ticks_per_frame*/,
                       int32_t /*width*/, int32_t /*height*/, int32_t /*par_num*/,
                       int32_t /*par_den*/, const HX_RenderParams* params, HX_String* text) {
-  return Operation("Video Segment Render.MakeIdentifier", [=](Core& core) {
-    return WithHandle(core.nodes, node, [&](const GraphNode& found) {
-      const std::optional<FrameRequest> request = RequestOf(found, time_ticks, params);
-      if (!request || !text || core.faults.identifier_failed) return HX_ERR_UNKNOWN;
-      *text = core.strings.Make(IdentifierOf(*request).ToText());
+  return Operation("Video Segment Render.MakeIdentifier", [=](Tables& tables) {
+    return WithHandle(tables.nodes, node, [&](const Node& found) {
+      const std::optional<FrameRequest> request = RequestOf(found.value, time_ticks, params);
+      if (!request || !text || found.core->faults.identifier_failed) return HX_ERR_UNKNOWN;
+      *text = tables.strings.Make(found.core->maker.Identifier(*request).ToText());
       return HX_ERR_NONE;
     });
   });
 }
 
 HX_Err Cancel(int32_t request_id) {
-  return GivingBack("Video Segment Render.Cancel", [=](Core& core) {
-    core.queue.Cancel(request_id, std::chrono::milliseconds(core.faults.late_callback_ms));
+  return GivingBack("Video Segment Render.Cancel", [=](Tables& tables) {
+    for (const MediaCorePtr& core : tables.Cores()) {
+      core->queue.Cancel(request_id, std::chrono::milliseconds(core->faults.late_callback_ms));
+    }
     return true;
   });
 }
 
 template <class Result, class Read>
 HX_Err Answer(const char* name, HX_Frame frame, Result* result, Read read) {
-  return Operation(name, [=](Core& core) {
-    return WithHandle(core.frames, frame, [&](const PicturePtr& picture) {
+  return Operation(name, [=](Tables& tables) {
+    return WithHandle(tables.frames, frame, [&](const PicturePtr& picture) {
       if (!result) return HX_ERR_UNKNOWN;
       *result = read(*picture);
       return HX_ERR_NONE;
@@ -120,30 +125,37 @@ HX_Err GetSize(HX_Frame frame, int32_t* width, int32_t* height) {
 }
 
 HX_Err DisposeFrame(HX_Frame frame) {
-  return GivingBack("CutPix.Dispose", [=](Core& core) { return core.frames.Remove(frame); });
+  return GivingBack("CutPix.Dispose", [=](Tables& tables) { return tables.frames.Remove(frame); });
 }
 
 HX_Err Lookup(const HX_Guid* identifier, HX_Frame* frame) {
-  return Operation("CutPix Cache.Lookup", [=](Core& core) {
+  return Operation("CutPix Cache.Lookup", [=](Tables& tables) {
     if (!identifier || !frame) return HX_ERR_UNKNOWN;
-    const PicturePtr picture = core.cache.Find(GuidOf(*identifier));
-    *frame = picture ? core.frames.Add(picture) : 0;
+    const Guid guid = GuidOf(*identifier);
+    const MediaCorePtr core = tables.CoreOf(NumberOf(guid));
+    const PicturePtr picture = core ? core->cache.Find(guid) : nullptr;
+    *frame = picture ? tables.frames.Add(picture) : 0;
     return HX_ERR_NONE;
   });
 }
 
 HX_Err Reference(const HX_Guid* identifier) {
-  return Operation("CutPix Cache.Reference", [=](Core& core) {
+  return Operation("CutPix Cache.Reference", [=](Tables& tables) {
     if (!identifier) return HX_ERR_UNKNOWN;
-    core.cache.Reference(GuidOf(*identifier));
+    const Guid guid = GuidOf(*identifier);
+    const MediaCorePtr core = tables.CoreOf(NumberOf(guid));
+    if (!core) return HX_ERR_UNKNOWN;
+    core->cache.Reference(guid);
     return HX_ERR_NONE;
   });
 }
 
 HX_Err Dereference(const HX_Guid* identifier) {
-  return GivingBack("CutPix Cache.Dereference", [=](Core& core) {
-    if (identifier) core.cache.Dereference(GuidOf(*identifier));
-    return identifier != nullptr;
+  return GivingBack("CutPix Cache.Dereference", [=](Tables& tables) {
+    if (!identifier) return false;
+    const Guid guid = GuidOf(*identifier);
+    if (const MediaCorePtr core = tables.CoreOf(NumberOf(guid))) core->cache.Dereference(guid);
+    return true;
   });
 }
 

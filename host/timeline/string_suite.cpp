@@ -6,31 +6,31 @@
 namespace calmframe::host {
 namespace {
 
-using Core = MediaCore;
+using Tables = MediaTables;
 
 HX_Err MakeFromUTF8(const char* text, HX_String* string) {
-  return Operation("String.MakeFromUTF8", [=](Core& core) {
+  return Operation("String.MakeFromUTF8", [=](Tables& tables) {
     if (!text || !string) return HX_ERR_UNKNOWN;
-    *string = core.strings.Make(text);
+    *string = tables.strings.Make(text);
     return HX_ERR_NONE;
   });
 }
 
 HX_Err MakeFromUTF16(const uint16_t* text, HX_String* string) {
-  return Operation("String.MakeFromUTF16", [=](Core& core) {
+  return Operation("String.MakeFromUTF16", [=](Tables& tables) {
     if (!text || !string) return HX_ERR_UNKNOWN;
     std::u16string units;
     for (const std::uint16_t* unit = text; *unit != 0; ++unit) {
       units.push_back(static_cast<char16_t>(*unit));
     }
-    *string = core.strings.Make(tessel::utility::ToUTF8(units));
+    *string = tables.strings.Make(tessel::utility::ToUTF8(units));
     return HX_ERR_NONE;
   });
 }
 
 HX_Err GetUTF8(HX_String string, const char** text) {
-  return Operation("String.GetUTF8", [=](Core& core) {
-    const HX_StringRecord* const found = core.strings.Find(string);
+  return Operation("String.GetUTF8", [=](Tables& tables) {
+    const HX_StringRecord* const found = tables.strings.Find(string);
     if (!found || !text) return HX_ERR_UNKNOWN;
     *text = found->utf8.c_str();
     return HX_ERR_NONE;
@@ -38,8 +38,8 @@ HX_Err GetUTF8(HX_String string, const char** text) {
 }
 
 HX_Err GetUTF16(HX_String string, const uint16_t** text) {
-  return Operation("String.GetUTF16", [=](Core& core) {
-    const HX_StringRecord* const found = core.strings.Find(string);
+  return Operation("String.GetUTF16", [=](Tables& tables) {
+    const HX_StringRecord* const found = tables.strings.Find(string);
     if (!found || !text) return HX_ERR_UNKNOWN;
     *text = found->utf16.data();
     return HX_ERR_NONE;
@@ -47,14 +47,15 @@ HX_Err GetUTF16(HX_String string, const uint16_t** text) {
 }
 
 HX_Err Dispose(HX_String string) {
-  return GivingBack("String.Dispose", [=](Core& core) { return core.strings.Dispose(string); });
+  return GivingBack("String.Dispose",
+                    [=](Tables& tables) { return tables.strings.Dispose(string); });
 }
 
 HX_Err GetFileName(HX_String path, HX_String* name) {
-  return Operation("String.GetFileName", [=](Core& core) {
-    const HX_StringRecord* const found = core.strings.Find(path);
+  return Operation("String.GetFileName", [=](Tables& tables) {
+    const HX_StringRecord* const found = tables.strings.Find(path);
     if (!found || !name) return HX_ERR_UNKNOWN;
-    *name = core.strings.Make(found->utf8.substr(found->utf8.rfind('/') + 1));
+    *name = tables.strings.Make(found->utf8.substr(found->utf8.rfind('/') + 1));
     return HX_ERR_NONE;
   });
 }

@@ -9,7 +9,7 @@ drawn steady, in any order and from several threads:
         session.wait()
         steady = [session.render(number, frame) for number, frame in enumerate(frames)]
 
-One session can be open in a process. Failures raise Error, whose `code` is a name such as
+Any number of sessions may be open at once. Failures raise Error, whose `code` is a name such as
 "CALMFRAME_ERROR_SOLVE"; arrays of a wrong shape or type raise ValueError.
 """
 

@@ -153,7 +153,7 @@ class TourThreads : public PlayedPlugin {
     const std::size_t which = random() % 19;
     if (which < std::size(acts)) return acts[which]();
     session().Tick();  // as a host's loop does
-    host().WaitForWake(2ms);
+    host().wake()->Wait(2ms);
   }
 
   std::vector<boost::shared_ptr<Layer>> layers_;

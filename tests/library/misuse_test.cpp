@@ -70,12 +70,11 @@ TEST(LibraryMisuseTest, OptionsThatThereAreNot) {
   const Opened after(street.Options());  // none of these left anything open
 }
 
-TEST(LibraryMisuseTest, OneSessionAtATimeAndNoneThatIsClosed) {
+TEST(LibraryMisuseTest, NoSessionThatIsClosed) {
   const Street street;
   calmframe_session first, second;
   const calmframe_options options = street.Options();
   ASSERT_EQ(calmframe_open(&options, &first), CALMFRAME_OK);
-  EXPECT_EQ(calmframe_open(&options, &second), CALMFRAME_ERROR_BUSY);
   EXPECT_EQ(calmframe_close(first), CALMFRAME_OK);
   EXPECT_EQ(calmframe_close(first), CALMFRAME_ERROR_ARGUMENT);
   EXPECT_EQ(calmframe_start(first), CALMFRAME_ERROR_ARGUMENT);

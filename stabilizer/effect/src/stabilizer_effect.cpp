@@ -1,7 +1,8 @@
 #include "stabilizer/effect/src/stabilizer_effect.h"
 
 #include <boost/make_shared.hpp>
-#include <memory>
+#include <map>
+#include <mutex>
 #include <utility>
 
 #include "analysis/effect/banner_cache.h"
@@ -28,21 +29,37 @@ using analysis::effect::EffectParameters;
 
 namespace {
 
-// What the host's records point at: texts of the open string table, and literals.
-ParameterTexts& TextsOf(const HostContext& context) {
-  struct Texts {
-    std::uint64_t token;
-    ParameterTexts texts;
-  };
-  static std::unique_ptr<Texts> kept;
-  const std::uint64_t token = GlobalsLock(context)->string_token;
-  if (!kept || kept->token != token) {
-    const HX_Callbacks& host = *context.in->cb;
-    kept.reset(new Texts{token, ParameterTexts([&host, token](std::int32_t number) {
-                           return host.get_string(token, number, 0, 0);
-                         })});
+// What the hosts' records point at: texts of the open string tables, and literals. By the tables'
+// tokens, since a process may have several hosts, each with a thread of its own.
+struct OpenTexts {
+  std::mutex mutex;
+  std::map<std::uint64_t, ParameterTexts> by_token;  // guarded by mutex
+
+  static OpenTexts& Get() {
+    static OpenTexts texts;
+    return texts;
   }
-  return kept->texts;
+};
+
+ParameterTexts& TextsOf(const HostContext& context) {
+  const std::uint64_t token = GlobalsLock(context)->string_token;
+  const HX_Callbacks& host = *context.in->cb;
+  OpenTexts& texts = OpenTexts::Get();
+  const std::lock_guard lock(texts.mutex);
+  const auto found = texts.by_token.find(token);
+  if (found != texts.by_token.end()) return found->second;
+  return texts.by_token
+      .try_emplace(token, [&host, token](
+                              std::int32_t number) { return host.get_string(token, number, 0, 0); })
+      .first->second;
+}
+
+void ForgetTexts(const HostContext& context) {
+  if (!context.in->global_data) return;
+  const std::uint64_t token = GlobalsLock(context)->string_token;
+  OpenTexts& texts = OpenTexts::Get();
+  const std::lock_guard lock(texts.mutex);
+  texts.by_token.erase(token);
 }
 
 std::int32_t PopupOf(HX_ParamDef** params, ParamIndex index) {
@@ -65,7 +82,8 @@ void StabilizerEffect::StartPlugin() {
 }
 
 void StabilizerEffect::StopPlugin() {
-  analysis::JobRegistry::Instance().CancelAll();
+  analysis::JobRegistry::Instance().CancelAll(context().in->global_data);
+  ForgetTexts(context());
   ClosePlugin(context());
 }
 

@@ -240,7 +240,8 @@ SavedState StabilizerState::Save() const {
   return saved;
 }
 
-void StabilizerState::Load(const SavedState& saved, const analysis::JobFactory& make_job) {
+void StabilizerState::Load(const SavedState& saved, HX_Handle plugin,
+                           const analysis::JobFactory& make_job) {
   source = saved.source;
   result = saved.result;
   solve_result = saved.solve_result;
@@ -249,8 +250,8 @@ void StabilizerState::Load(const SavedState& saved, const analysis::JobFactory& 
   progress.start_tick = saved.analysis_tick;
   detailed = saved.detailed;
   if (saved.job) {
-    analyzer =
-        boost::make_shared<analysis::AnalyzerPrem>(*saved.job, result->source_identity, make_job);
+    analyzer = boost::make_shared<analysis::AnalyzerPrem>(*saved.job, result->source_identity,
+                                                          plugin, make_job);
     analysis_pending = saved.analysis_pending;  // else frames would wait for nothing
   }
   MakeResultIdentityUnique();

@@ -87,7 +87,7 @@ class StabilizerState final : public analysis::AnalysisState {
   // on is known to be missing. An analysis that is not done comes back with an analyzer whose jobs
   // are made by make_job; see Analyzer::CanGoOn.
   SavedState Save() const;
-  void Load(const SavedState& saved, const analysis::JobFactory& make_job);
+  void Load(const SavedState& saved, HX_Handle plugin, const analysis::JobFactory& make_job);
 
   SolvePhase phase = SolvePhase::None;
   bool needs_solve = false;

@@ -83,7 +83,8 @@ void LoadInstance(const HostContext& context, FlattenedInstance kind, Stabilizer
       Refuse(context, kBadSerializedData);
   }
   try {
-    state.Load(ReadPayload(context, context.in->instance_handle), MakeVideoSegmentRenderSuiteJob);
+    state.Load(ReadPayload(context, context.in->instance_handle), context.in->global_data,
+               MakeVideoSegmentRenderSuiteJob);
   } catch (const StateRefused& refused) {
     Refuse(context, refused);
   }

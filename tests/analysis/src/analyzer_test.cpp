@@ -4,6 +4,7 @@
 
 #include <boost/make_shared.hpp>
 #include <new>
+#include <utility>
 
 #include "analysis/src/analysis_state.h"
 #include "analysis/src/identities.h"
@@ -21,7 +22,7 @@ class AnalyzerTest : public calmframe::host::HostRecords {
   AnalyzerTest() { hosted_.Place(0, 3); }
   ~AnalyzerTest() override {
     release_.Signal();
-    JobRegistry::Instance().CancelAll();
+    JobRegistry::Instance().CancelAll(in_.global_data);
     tessel::threads::Shutdown();
     EXPECT_EQ(FakeJob::living, 0);
   }
@@ -114,6 +115,21 @@ TEST_F(AnalyzerTest, EqualInputSharesOneJobWhateverItsParameters) {
   EXPECT_TRUE(second->ReportFailure(&in_, &out_));
   EXPECT_EQ(TakeMessage(), "");
   EXPECT_TRUE(longer->GetFeatures());
+}
+
+TEST_F(AnalyzerTest, AnotherHostsEffectsHaveTheirOwn) {
+  stop_at_ = "get 0";
+  const auto first = Started();
+  const HX_Handle own = std::exchange(in_.global_data, reinterpret_cast<HX_Handle>(this));
+  const auto other = Started();
+  EXPECT_EQ(jobs_.size(), 2u);
+  reached_.Wait();
+  JobRegistry::Instance().CancelAll(in_.global_data);
+  in_.global_data = own;
+  release_.Signal();
+  for (std::size_t i = 0; i < 2; ++i) WaitForJob(i);
+  EXPECT_TRUE(first->GetFeatures());
+  EXPECT_FALSE(other->GetFeatures());
 }
 
 TEST_F(AnalyzerTest, AFinishedJobWaitsForLateJoinersThatWantTheSame) {
@@ -222,23 +238,23 @@ TEST_F(AnalyzerTest, AReloadedAnalyzerFindsItsJobAgain) {
   const auto source = analyzer->GetSourceIdentity();
   analyzer.reset();
   reached_.Wait();
-  AnalyzerPrem reloaded(record, source, Factory());
+  AnalyzerPrem reloaded(record, source, in_.global_data, Factory());
   EXPECT_TRUE(reloaded.CanGoOn());
   EXPECT_TRUE(reloaded.IsActive());
   AnalyzerRecord changed = record;
   changed.job_stage = JobStage::NotStarted;
-  EXPECT_FALSE(AnalyzerPrem(changed, source, Factory()).IsActive());
+  EXPECT_FALSE(AnalyzerPrem(changed, source, in_.global_data, Factory()).IsActive());
   changed = record;
   changed.tracker_guid = {};
-  EXPECT_FALSE(AnalyzerPrem(changed, source, Factory()).CanGoOn());
+  EXPECT_FALSE(AnalyzerPrem(changed, source, in_.global_data, Factory()).CanGoOn());
   release_.Signal();
   WaitForJob(0);
   EXPECT_TRUE(reloaded.CanGoOn());
   EXPECT_EQ(reloaded.GetFeatures()->frame_count, 3);
   Stop(reloaded);
-  EXPECT_FALSE(AnalyzerPrem(record, source, Factory()).CanGoOn());
+  EXPECT_FALSE(AnalyzerPrem(record, source, in_.global_data, Factory()).CanGoOn());
   changed.job_stage = JobStage::NotStarted;
-  EXPECT_TRUE(AnalyzerPrem(changed, {}, Factory()).CanGoOn());
+  EXPECT_TRUE(AnalyzerPrem(changed, {}, in_.global_data, Factory()).CanGoOn());
 }
 
 TEST_F(AnalyzerTest, LogsItsParametersAsNumbers) {

@@ -120,14 +120,50 @@ TEST_F(SessionTest, SavesLoadsAndDuplicates) {
   EXPECT_FALSE(session->Load(MakeDrawnLayer(), saved).creation().ok());
 }
 
+// Side by side: what the plug-in asks for is done to the one it is about.
+TEST_F(SessionTest, TwoHostsHaveLoopsAndDeclarationsOfTheirOwn) {
+  on[HX_CMD_DECLARE_PARAMS] = [](const Call& call) -> HX_Err {
+    HX_ParamDef param{};
+    param.kind = HX_PARAM_CHECKBOX;
+    call.out->num_params = 2;
+    return call.cb().add_param(nullptr, -1, &param);
+  };
+  auto other = std::make_unique<Host>(Probe());
+  EXPECT_EQ(other->declarations().size(), 2u);
+  on.clear();
+  const Host third(Probe());
+  EXPECT_EQ(third.declarations().size(), 1u);
+  Session others(*other);
+  HX_EffectRef effect = nullptr;
+  on[HX_CMD_CREATE_INSTANCE] = [&](const Call& call) -> HX_Err {
+    effect = call.ref();
+    call.Suite<HX_AdvAppSuite1>(HX_ADV_APP_SUITE, HX_ADV_APP_SUITE_VERSION)->RefreshAllWindows();
+    return HX_ERR_NONE;
+  };
+  others.Apply(MakeDrawnLayer());
+  EXPECT_EQ(other->user_interface().refreshes(), 1u);
+  EXPECT_EQ(host->user_interface().refreshes(), 0u);
+  const HX_PrivateEffectSuite3* suite = nullptr;
+  on[HX_CMD_IDLE_TICK] = [&](const Call& call) -> HX_Err {
+    suite =
+        call.Suite<HX_PrivateEffectSuite3>(HX_PRIVATE_EFFECT_SUITE, HX_PRIVATE_EFFECT_SUITE_VERSION)
+            .get();
+    return HX_ERR_NONE;
+  };
+  others.Tick();
+  ASSERT_EQ(suite->ForceRerender(effect), HX_ERR_NONE);  // on no host's command
+  EXPECT_TRUE(other->wake()->Wait(0ms));
+  EXPECT_FALSE(host->wake()->Wait(0ms));
+}
+
 TEST_F(SessionTest, OtherThreadsPostAndWake) {
   bool ran = false;
   std::jthread([&] {
     EXPECT_THROW(session->Tick(), std::logic_error);
     session->Post([&] { ran = true; });
   }).join();
-  EXPECT_TRUE(host->WaitForWake(0ms));
-  EXPECT_FALSE(host->WaitForWake(0ms));
+  EXPECT_TRUE(host->wake()->Wait(0ms));
+  EXPECT_FALSE(host->wake()->Wait(0ms));
   session->Tick();
   EXPECT_TRUE(ran);
 }

@@ -239,6 +239,41 @@ TEST_F(RenderSuitesTest, ReferencedPixelsOutliveTheirHandles) {
   EXPECT_FALSE(Cached(identifier));
 }
 
+// Equal media in two services of a process: each has its own frames, and its own failures.
+TEST_F(RenderSuitesTest, AnotherServicesFramesAreNobodyElses) {
+  const auto its_effect = reinterpret_cast<HX_EffectRef>(&services);
+  const auto its_layer = boost::make_shared<Layer>(MakeDrawnSource(
+      DrawnInfo(6, 4, 20), [](std::int64_t, Picture&) { throw std::runtime_error("its own"); }));
+  its_layer->InsertEffect(0, {kOwnId, "Own", "", {}});
+  auto other = std::make_unique<MediaServices>();
+  other->AttachEffect(its_effect, its_layer, kOwnId);
+  HX_Segments segments = 0;
+  HX_Node top = 0, input = 0;
+  ASSERT_EQ(sequence.AcquireSegments(its_effect, &segments), HX_ERR_NONE);
+  ASSERT_EQ(graph.GetSegmentNodeAt(segments, 0, &top), HX_ERR_NONE);
+  ASSERT_EQ(graph.GetInput(top, 0, &input), HX_ERR_NONE);
+  EXPECT_EQ(sequence.ReleaseSegments(segments), HX_ERR_NONE);
+  EXPECT_EQ(graph.ReleaseNode(top), HX_ERR_NONE);
+  const Node own = InputNode(), its(graph, input);
+  const HX_Guid identifier = GuidAt(own, kFrame), its_identifier = GuidAt(its, kFrame);
+  EXPECT_EQ(Shown(own, kFrame, 3, 0), RedAndGreen(3, 1));
+  EXPECT_EQ(Shown(its, kFrame, 3, 0), RedAndGreen(-1, -1));
+  EXPECT_TRUE(Cached(identifier));
+  EXPECT_FALSE(Cached(its_identifier));
+  EXPECT_EQ(services.failure(), "");
+  EXPECT_EQ(other->failure(), "its own");
+  EXPECT_EQ(services.counts().delivered, 1u);
+  EXPECT_EQ(other->counts().delivered, 0u);
+  // A reference stands in the cache it is of, also when that is gone.
+  EXPECT_EQ(cache.Reference(&its_identifier), HX_ERR_NONE);
+  EXPECT_EQ(services.counts().references, 0u);
+  MediaServices::DetachEffect(its_effect);
+  other.reset();
+  EXPECT_EQ(cache.Dereference(&its_identifier), HX_ERR_NONE);
+  Delivery delivery;
+  EXPECT_NE(Ask(its, kFrame, delivery), HX_ERR_NONE) << "closed, though its node is still lent";
+}
+
 TEST_F(RenderSuitesTest, InputIsScaledConvertedAndNullPastTheEnd) {
   const PicturePtr half = Input(2, PixelKind::argbf, 3, 2);
   ASSERT_TRUE(half);

@@ -150,10 +150,10 @@ TEST_F(SolveServiceTest, ASolveThatEndsBringsTheHostBack) {
   hosted.HoldSolve("End - RunCropper()");
   hosted.Set(kSmoothness, 30);
   hosted.TickUntilHeld();
-  while (hosted.host().WaitForWake(0ms)) continue;
+  while (hosted.host().wake()->Wait(0ms)) continue;
   const std::uint64_t generation = hosted.Generation();
   hosted.Release();
-  EXPECT_TRUE(hosted.host().WaitForWake(1min));
+  EXPECT_TRUE(hosted.host().wake()->Wait(1min));
   EXPECT_GT(hosted.Generation(), generation);
   EXPECT_EQ(hosted.Status(), 6) << "the rest is for a tick";
   EXPECT_EQ(hosted.Settle(), 8);

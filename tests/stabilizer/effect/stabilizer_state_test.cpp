@@ -29,7 +29,8 @@ void Fill(StabilizerState& state, std::int32_t first_frame) {
   state.phase = SolvePhase::Solved;
   analysis::AnalyzerRecord job;
   job.tracker_guid = Guid::MakeUnique();
-  state.analyzer = boost::make_shared<analysis::AnalyzerPrem>(job, Guid(), analysis::JobFactory());
+  state.analyzer =
+      boost::make_shared<analysis::AnalyzerPrem>(job, Guid(), nullptr, analysis::JobFactory());
   state.detailed = true;
   state.progress.start_tick = 1234;
 }
@@ -87,7 +88,7 @@ TEST_F(StabilizerStateTest, WhatIsSavedIsLoaded) {
     EXPECT_FALSE(saved.analysis_pending);
     saved.analysis_pending = true;
     StabilizerState loaded({}, false);
-    loaded.Load(saved, {});
+    loaded.Load(saved, nullptr, {});
     ASSERT_EQ(loaded.analyzer != nullptr, has_job);
     EXPECT_EQ(loaded.analysis_pending, has_job) << "else frames would wait for nothing";
     if (has_job) {
