@@ -17,6 +17,7 @@
 
 #include "host/media/clip_files.h"
 #include "host/media/frame_index.h"
+#include "host/project/project_keeper.h"
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
 
@@ -34,13 +35,18 @@ constexpr std::int64_t kVersion = 5;
 constexpr char kChecksum[] = "checksum";
 constexpr char kCreate[] =
     "DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS parameter; DROP TABLE IF EXISTS instance;"
-    "DROP TABLE IF EXISTS frames; DROP TABLE IF EXISTS shot;"
+    "DROP TABLE IF EXISTS frames; DROP TABLE IF EXISTS shot; DROP TABLE IF EXISTS analysis;"
     "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
     "CREATE TABLE shot (number INTEGER PRIMARY KEY, start_frame INTEGER NOT NULL,"
     " length INTEGER NOT NULL, choice TEXT NOT NULL, instance BLOB NOT NULL);"
     "CREATE TABLE parameter (shot INTEGER, disk_id INTEGER, value REAL NOT NULL,"
     " PRIMARY KEY (shot, disk_id)) WITHOUT ROWID;"
     "CREATE TABLE frames (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
+    "PRAGMA application_id = 1130458221; PRAGMA user_version = 5;";
+// See ProjectKeeper.
+constexpr char kCreateWithoutWork[] =
+    "CREATE TABLE analysis (start_frame INTEGER, number INTEGER, bytes BLOB NOT NULL,"
+    " PRIMARY KEY (start_frame, number)) WITHOUT ROWID;"
     "PRAGMA application_id = 1130458221; PRAGMA user_version = 5;";
 static_assert(kApplicationId == 1130458221 && kVersion == 5);
 
@@ -286,7 +292,8 @@ void Sync(const fs::path& place) {
 }
 
 // A new file gets its name when it is whole.
-void Create(const fs::path& path, const Project& project) {
+template <class Fill>
+void Create(const fs::path& path, const Fill& fill) {
   std::string temporary = path.parent_path() / ".";
   temporary += path.filename().string();
   temporary += ".XXXXXX";
@@ -297,8 +304,7 @@ void Create(const fs::path& path, const Project& project) {
     {
       SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
       database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
-      database.Run(kCreate);
-      Write(database, project);
+      fill(database);
       database.Run("COMMIT");
     }
     chmod(temporary.c_str(), 0644);
@@ -336,8 +342,21 @@ void SaveProject(const std::string& path, const Project& project, std::size_t mo
   if (fs::exists(place, error)) {
     Replace(place, saved);
   } else {
-    Create(place, saved);
+    Create(place, [&](SqliteDatabase& database) {
+      database.Run(kCreate);
+      Write(database, saved);
+    });
   }
+} catch (const SqliteError& error) {
+  Fail(path, error);
+} catch (const fs::filesystem_error& error) {
+  Fail(path, error.code().message());
+}
+
+void CreateWithoutWork(const std::string& path) try {
+  std::error_code error;
+  Create(fs::weakly_canonical(fs::absolute(path), error),
+         [](SqliteDatabase& database) { database.Run(kCreateWithoutWork); });
 } catch (const SqliteError& error) {
   Fail(path, error);
 } catch (const fs::filesystem_error& error) {
@@ -350,6 +369,7 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   // For writing, since an interrupted save is first taken back; SQLite does without where it must.
   SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
   const std::int64_t version = CheckedVersion(path, database);
+  if (!HoldsWork(path)) Fail(path, "holds an analysis that was stopped, and no work yet");
   Project project;
   SqliteStatement setting(database, "SELECT value FROM setting WHERE key = ?");
   VisitSettings(project, version, SettingReader{setting});

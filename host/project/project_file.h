@@ -59,6 +59,9 @@ constexpr std::size_t kMaximumInstanceBytes = std::size_t{900} << 20;
 void SaveProject(const std::string& path, const Project& project,
                  std::size_t most = kMaximumInstanceBytes);
 
+// A file of saved work that has none yet. Throws ProjectFailure.
+void CreateWithoutWork(const std::string& path);
+
 // Throws ProjectFailure: not there or not readable, no project, damaged, of a newer version, too
 // large, which is found before it is read.
 Project LoadProject(const std::string& path, std::size_t most = kMaximumInstanceBytes);
