@@ -48,7 +48,9 @@ class Shot final : public ClipWarps {
     }
   }
   std::size_t frameCount() const override { return warps_.size(); }
-  const VarVector& frameWarp(std::size_t frame) const override { return warps_[frame]; }
+  boost::shared_ptr<const VarVector> frameWarp(std::size_t frame) const override {
+    return boost::make_shared<const VarVector>(warps_[frame]);
+  }
   bool warpedGridOfFrame(std::size_t M, std::size_t, VarVector& warp) const override {
     warp = warps_[M];
     return true;

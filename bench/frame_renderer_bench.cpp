@@ -40,7 +40,9 @@ class Clip final : public ClipWarps {
     }
   }
   std::size_t frameCount() const override { return 1; }
-  const VarVector& frameWarp(std::size_t) const override { return warp_; }
+  boost::shared_ptr<const VarVector> frameWarp(std::size_t) const override {
+    return boost::make_shared<const VarVector>(warp_);
+  }
   bool warpedGridOfFrame(std::size_t, std::size_t, VarVector&) const override { return false; }
   frame_bounds unionBounds() const override { return bounds_; }
   std::int32_t frameWidth() const override { return width_; }

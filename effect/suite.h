@@ -38,6 +38,9 @@ template <>
 inline constexpr SuiteId kSuite<HX_AnalysisSpanSuite1>{HX_ANALYSIS_SPAN_SUITE,
                                                        HX_ANALYSIS_SPAN_SUITE_VERSION};
 template <>
+inline constexpr SuiteId kSuite<HX_AnalysisKeepingSuite1>{HX_ANALYSIS_KEEPING_SUITE,
+                                                          HX_ANALYSIS_KEEPING_SUITE_VERSION};
+template <>
 inline constexpr SuiteId kSuite<HX_StabilizerHostSuite7>{HX_STABILIZER_HOST_SUITE,
                                                          HX_STABILIZER_HOST_SUITE_VERSION};
 template <>

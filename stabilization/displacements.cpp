@@ -22,14 +22,6 @@ std::vector<std::int32_t> window_of_frame(std::size_t frame_count,
   return owner;
 }
 
-// A window's own sample of a feature; null where its table has none.
-const track_sample* overlap_sample(const factorization_window& window, std::size_t frame,
-                                   std::size_t feature, std::size_t feature_count) {
-  const std::size_t i = (frame - window.first) * feature_count + feature;
-  if (i >= window.overlap_rows.size() || window.overlap_rows[i].status < 0) return nullptr;
-  return &window.overlap_rows[i];
-}
-
 displacement_lists empty_lists(const stabilizer_global& global) {
   // Room for every sample of every track, so that lists of half a gigabyte are never copied.
   std::vector<std::ptrdiff_t> starts_less_ends(global.frame_count + 1);
@@ -78,53 +70,103 @@ void append_track(displacement_lists& lists, const stabilizer_global& global,
 
 }  // namespace
 
-displacement_lists blended_displacements(const stabilizer_global& global,
-                                         const std::vector<factorization_window>& windows,
-                                         const SolverParamsRecord& parameters,
-                                         const progress_functor& progress) {
-  const std::vector<std::int32_t> owner = window_of_frame(
-      global.frame_count, windows, [](const factorization_window& w) { return w.overlap_end; });
-  displacement_lists lists = empty_lists(global);
+blended_tracks::blended_tracks(const stabilizer_global& global,
+                               const std::vector<factorization_window>& windows,
+                               const SolverParamsRecord& parameters,
+                               const progress_functor& progress)
+    : global_(global),
+      fade_duration_(parameters.track_fade_duration),
+      owner_(window_of_frame(global.frame_count, windows,
+                             [](const factorization_window& w) { return w.overlap_end; })) {
+  for (const factorization_window& window : windows) {
+    overlaps_.push_back({window.first, window.overlap_end, window.overlap_rows});
+  }
+  spans_.reserve(global.trajectories.size());
   for (const Trajectory& track : global.trajectories) {
     progress();
-    const auto stabilized = [&](std::int32_t f) -> const track_sample* {
-      const track_sample& sample = global.output_at(f, track.feature);
-      return sample.status < 0 ? nullptr : &sample;
-    };
-    const auto windowed = [&](std::int32_t f) {
-      return overlap_sample(windows[owner[f]], f, track.feature, global.feature_count);
-    };
     std::int32_t first = track.first;
-    while (first < track.last && !stabilized(first)) ++first;
+    while (first < track.last && !stabilized(first, track)) ++first;
     std::int32_t end = first;
-    while (end < track.last && (owner[end] == kNoWindow ? stabilized(end) : windowed(end))) ++end;
-
-    append_track(lists, global, track, first, end, parameters,
-                 [&](Displacement& record, std::int32_t f) {
-                   const track_sample* s = stabilized(f);
-                   const track_sample* w = owner[f] == kNoWindow ? nullptr : windowed(f);
-                   if (!s && !w) return false;
-                   if (owner[f] == kNoWindow) {
-                     record.targetX = s->x;
-                     record.targetY = s->y;
-                     return true;
-                   }
-                   const factorization_window& window = windows[owner[f]];
-                   const double t = static_cast<double>(window.overlap_end - f) /
-                                    static_cast<double>(window.overlap_end - window.first + 1);
-                   if (s && w) {
-                     record.targetX = t * w->x + (1 - t) * s->x;
-                     record.targetY = t * w->y + (1 - t) * s->y;
-                     return true;
-                   }
-                   const track_sample& only = w ? *w : *s;
-                   record.targetX = only.x;
-                   record.targetY = only.y;
-                   record.weight *= w ? t : 1 - t;
-                   return true;
-                 });
+    while (end < track.last &&
+           (owner_[end] == kNoWindow ? stabilized(end, track) : windowed(end, track))) {
+      ++end;
+    }
+    if (end - first < std::max(parameters.track_fade_minimum, 1)) end = first;
+    spans_.push_back({first, end});
   }
-  return lists;
+}
+
+const track_sample* blended_tracks::stabilized(std::int32_t frame, const Trajectory& track) const {
+  const track_sample& sample = global_.output_at(frame, track.feature);
+  return sample.status < 0 ? nullptr : &sample;
+}
+
+const track_sample* blended_tracks::windowed(std::int32_t frame, const Trajectory& track) const {
+  const overlap& window = overlaps_[owner_[frame]];
+  const std::size_t i = (frame - window.first) * global_.feature_count + track.feature;
+  if (i >= window.rows.size() || window.rows[i].status < 0) return nullptr;
+  return &window.rows[i];
+}
+
+bool blended_tracks::complete(Displacement& record, std::int32_t frame) const {
+  const bool alone = owner_[frame] == kNoWindow;
+  const track_sample* s = stabilized(frame, *record.track);
+  const track_sample* w = alone ? nullptr : windowed(frame, *record.track);
+  if (!s && !w) return false;
+  if (alone) {
+    record.targetX = s->x;
+    record.targetY = s->y;
+    return true;
+  }
+  const overlap& window = overlaps_[owner_[frame]];
+  const double t =
+      static_cast<double>(window.end - frame) / static_cast<double>(window.end - window.first + 1);
+  if (s && w) {
+    record.targetX = t * w->x + (1 - t) * s->x;
+    record.targetY = t * w->y + (1 - t) * s->y;
+    return true;
+  }
+  const track_sample& only = w ? *w : *s;
+  record.targetX = only.x;
+  record.targetY = only.y;
+  record.weight *= w ? t : 1 - t;
+  return true;
+}
+
+displacement_stream::displacement_stream(const blended_tracks& tracks, std::int32_t first_frame)
+    : tracks_(tracks), frame_(first_frame) {}
+
+std::vector<Displacement> displacement_stream::next(std::vector<Displacement>* before) {
+  const stabilizer_global& global = tracks_.global_;
+  const auto& trajectories = global.trajectories;
+  std::erase_if(
+      active_, [&](const active& track) { return tracks_.spans_[track.trajectory].end <= frame_; });
+  for (; next_trajectory_ < trajectories.size() && trajectories[next_trajectory_].first <= frame_;
+       ++next_trajectory_) {
+    if (tracks_.spans_[next_trajectory_].end > frame_) active_.push_back({next_trajectory_, -1});
+  }
+  std::vector<Displacement> list;
+  list.reserve(active_.size());
+  for (active& track : active_) {
+    const auto [first, end] = tracks_.spans_[track.trajectory];
+    if (frame_ < first) continue;
+    Displacement record;
+    record.track = &trajectories[track.trajectory];
+    const track_sample& source = global.input_at(frame_, record.track->feature);
+    record.sourceX = source.x;
+    record.sourceY = source.y;
+    const fade_span span = {end - first, first == 0,
+                            static_cast<std::uint64_t>(end) == global.frame_count};
+    record.weight = fade_weight(span, frame_ - first, tracks_.fade_duration_);
+    record.prevIndex = before ? track.previous : -1;
+    track.previous = -1;
+    if (!tracks_.complete(record, frame_)) continue;
+    track.previous = static_cast<std::int32_t>(list.size());
+    if (record.prevIndex >= 0) (*before)[record.prevIndex].nextIndex = track.previous;
+    list.push_back(record);
+  }
+  ++frame_;
+  return list;
 }
 
 displacement_lists member_displacements(const stabilizer_global& global,

@@ -112,6 +112,16 @@ FeatureTracker::FeatureTracker(const TrackerParams& params, std::size_t feature_
   }
 }
 
+std::vector<AffineState> FeatureTracker::States() const {
+  std::vector<AffineState> states;
+  for (const feature_slot& slot : slots_) states.push_back(slot.state);
+  return states;
+}
+
+void FeatureTracker::SetStates(const std::vector<AffineState>& states) {
+  for (std::size_t s = 0; s < slots_.size(); ++s) slots_[s].state = states.at(s);
+}
+
 void FeatureTracker::TrackAndVerify(const ImagePyramid& previous, const ImagePyramid& current,
                                     const tracking_feature<float>* previous_row,
                                     tracking_feature<float>* current_row, std::size_t feature_count,

@@ -27,6 +27,12 @@ class FeatureTracker {
   // Keeps what the slots of all seeds (status above 0) show in their first frame.
   void InitialiseSeeds(const ImagePyramid& current, const tracking_feature<float>* row);
 
+  // What it knows of its slots besides what the seeds showed; none without verification. A tracker
+  // that was given the seeds of the tracks that live, each with the pyramid of its own frame, and
+  // these, goes on to the same bits.
+  std::vector<AffineState> States() const;
+  void SetStates(const std::vector<AffineState>& states);
+
   // Follows each feature that lives in previous_row, for the first feature_count slots: writes x, y
   // and status kTracked to current_row, or status kLost; for the other slots status kEmpty. Counts
   // into statistics.translation.

@@ -34,6 +34,11 @@ class FrameSource {
     LoadColor(frame_index, pyramid.LevelData(0));
     BuildLevels(pyramid);
   }
+  // The same of a frame that the loop does not go on from, ahead of the first that it does.
+  virtual void LookBack(std::size_t frame_index, ImagePyramid& pyramid,
+                        std::vector<float>& scratch) {
+    LoadColorPyramid(frame_index, pyramid, scratch);
+  }
 };
 
 }  // namespace marrow::tracking

@@ -1,5 +1,7 @@
 #include <algorithm>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "analysis/effect/analysis_effect.h"
 #include "analysis/effect/analysis_parameter_rows.h"
@@ -41,6 +43,37 @@ void TellEnd(const kelp::effect::HostContext& context, Analyzer& analyzer) try {
   const JobInput& input = analyzer.record().job_input_parameters;
   const std::int64_t rows_a_frame = CountsFields(input) ? 2 : 1;
   analyzer.EndBefore(std::max<std::int64_t>(end - analyzer.FirstFrame(), 1) * rows_a_frame);
+} catch (std::int32_t) {
+  kelp::effect::ClearMessage(context);
+}
+
+// Has the host keep what the job has done, where it does that.
+void KeepPieces(const kelp::effect::HostContext& context, Analyzer& analyzer) try {
+  const ScopedSuite<HX_AnalysisKeepingSuite1> suite(context);
+  for (const Analysis::Piece& piece : analyzer.TakePieces()) {
+    ThrowIfFailed(suite->Keep(context.in->effect_ref, static_cast<std::uint32_t>(piece.number),
+                              piece.bytes.data(), piece.bytes.size()));
+  }
+  std::uint8_t wanted = 0;
+  ThrowIfFailed(suite->IsWanted(context.in->effect_ref, &wanted));
+  if (wanted != 0) analyzer.WantPiece();
+} catch (std::int32_t) {
+  kelp::effect::ClearMessage(context);
+}
+
+void GiveKeptPieces(const kelp::effect::HostContext& context, Analyzer& analyzer) try {
+  const ScopedSuite<HX_AnalysisKeepingSuite1> suite(context);
+  std::vector<Bytes> pieces;
+  while (true) {
+    const void* bytes = nullptr;
+    std::uint64_t size = 0;
+    const auto number = static_cast<std::uint32_t>(pieces.size());
+    ThrowIfFailed(suite->Find(context.in->effect_ref, number, &bytes, &size));
+    if (bytes == nullptr) break;
+    const auto* const first = static_cast<const std::uint8_t*>(bytes);
+    pieces.emplace_back(first, first + size);
+  }
+  analyzer.GiveKept(std::move(pieces));
 } catch (std::int32_t) {
   kelp::effect::ClearMessage(context);
 }
@@ -193,6 +226,7 @@ void AnalysisEffect::PollAnalysis(AnalysisState& state) {
     return;
   }
   TellEnd(context(), *analyzer);
+  KeepPieces(context(), *analyzer);
   const JobState job = analyzer->GetStatus().state;
   if (job == JobState::Running && analyzer->job_stage() != JobStage::SeenRunning) {
     analyzer->set_job_stage(JobStage::SeenRunning);
@@ -218,6 +252,7 @@ void AnalysisEffect::BeginPolledAnalysis(AnalysisState& state) {
   const boost::logic::tribool detailed = state.detailed;
   const boost::shared_ptr<Analyzer> analyzer = state.analyzer;
   state.DropAnalyzer();
+  GiveKeptPieces(context(), *analyzer);
   // One that can't start is gone, so that it is not tried again with each tick.
   try {
     analyzer->Start(context().in, context().out);

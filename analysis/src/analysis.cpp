@@ -2,6 +2,7 @@
 
 #include <limits>
 #include <stdexcept>
+#include <utility>
 
 #include "analysis/src/identities.h"
 #include "analysis/src/job_frame_source.h"
@@ -16,6 +17,48 @@ Analysis::Analysis(const marrow::tracking::SelectorParams& selector,
       selector_(selector),
       tracker_(tracker),
       tracker_identity_(GetIdentifierForTracker(selector, tracker)) {}
+
+class Analysis::Watcher final : public marrow::tracking::RunWatcher {
+ public:
+  Watcher(Analysis& analysis, std::size_t rows) : analysis_(analysis), all_rows_(rows) {}
+  bool Wants(std::size_t rows) override {
+    return rows < all_rows_ && analysis_.wanted_.exchange(false);
+  }
+  void Take(const marrow::tracking::RunState& state) override { analysis_.AddPiece(state); }
+
+ private:
+  Analysis& analysis_;
+  const std::size_t all_rows_;
+};
+
+void Analysis::TakeUp(const tessel::utility::Guid& run, const JobInput& input,
+                      const std::vector<Bytes>& pieces) {
+  run_ = run;
+  if (pieces.empty()) return;
+  const std::int64_t rows = GetRunFrames(input).frame_count;
+  if (rows < 1 || rows > std::numeric_limits<std::int32_t>::max()) return;
+  all_features_.feature_count = static_cast<std::int32_t>(selector_.max_count);
+  all_features_.frame_count = static_cast<std::int32_t>(rows);
+  *all_features_.features =
+      marrow::tracking::TrackCells(static_cast<std::size_t>(rows) * selector_.max_count);
+  for (const Bytes& piece : pieces) {
+    if (!TakeRunPiece(run_, piece, all_features_, taken_up_)) break;
+    ++next_piece_;
+  }
+  kept_rows_ = taken_up_.rows;
+}
+
+void Analysis::AddPiece(const marrow::tracking::RunState& state) {
+  Piece piece{next_piece_++, PackRunPiece(run_, all_features_, kept_rows_, state)};
+  kept_rows_ = state.rows;
+  const std::lock_guard lock(mutex_);
+  pieces_.push_back(std::move(piece));
+}
+
+std::vector<Analysis::Piece> Analysis::TakePieces() {
+  const std::lock_guard lock(mutex_);
+  return std::exchange(pieces_, {});
+}
 
 void Analysis::Run(Job& job) {
   try {
@@ -32,13 +75,19 @@ void Analysis::Track(Job& job) {
   }
   if (run.frame_count == 0) return;
 
-  JobFrameSource source(job);
+  const auto done = static_cast<std::int64_t>(taken_up_.rows);
+  JobFrameSource source(job, done);
   all_features_.first_frame = static_cast<std::int32_t>(run.first_frame);
   // Short tracks go after the dump, which shows every track.
   marrow::tracking::TrackerParams keep_all = tracker_;
   keep_all.kill_tracks_shorter_than = 0;
   try {
-    TrackFrames(source, selector_, keep_all, all_features_);
+    Watcher watcher(*this, static_cast<std::size_t>(run.frame_count));
+    if (done > 0) {
+      GoOnTracking(source, selector_, keep_all, all_features_, taken_up_, &watcher);
+    } else {
+      TrackFrames(source, selector_, keep_all, all_features_, nullptr, &watcher);
+    }
   } catch (const EndOfRun&) {  // the rows before it are whole
   }
   ShortenTable(all_features_, job.end_row(), 0);

@@ -6,6 +6,7 @@
 
 #include "analysis/src/identities.h"
 #include "analysis/src/job_frame_source.h"
+#include "analysis/src/mix_hash_guid.h"
 #include "analysis/src/param_fields.h"
 #include "analysis/src/read_job_input.h"
 #include "effect/host_text.h"
@@ -45,6 +46,14 @@ bool MayJoin(const JobRegistry::Entry& entry, const tessel::utility::Guid& track
   }
 }
 
+tessel::utility::Guid RunIdentity(const JobRegistry::Key& key,
+                                  const tessel::utility::Guid& tracker_guid) {
+  constexpr char kName[] = "RunIdentity";
+  MixHashGuid mix(kName);
+  for (const auto* guid : {&key.job, &key.source, &tracker_guid}) mix.AddValue(guid->bytes());
+  return mix.Finish();
+}
+
 bool IsUnderWay(const JobRegistry::Entry& entry) {
   return entry.job && entry.job->GetStatus().state <= JobState::Running;
 }
@@ -75,6 +84,14 @@ void Analyzer::Stop(HX_InData*, HX_OutData*) {
 }
 
 void Analyzer::EndBefore(std::int64_t) {}
+
+void Analyzer::GiveKept(std::vector<Bytes>) {}
+
+void Analyzer::WantPiece() {}
+
+std::vector<Analysis::Piece> Analyzer::TakePieces() {
+  return {};
+}
 
 std::int64_t Analyzer::FirstFrame() const {
   const JobInput& input = record_.job_input_parameters;
@@ -143,10 +160,13 @@ void AnalyzerPrem::Start(HX_InData* host_in, HX_OutData* host_out) {
         JobRegistry::Entry made;
         made.analysis =
             boost::make_shared<Analysis>(record_.selector_params, record_.tracker_params);
+        made.analysis->TakeUp(RunIdentity(key(), record_.tracker_guid),
+                              record_.job_input_parameters, kept_);
         made.job = make_job_(host_in, host_out, record_.job_input_parameters, made.analysis);
         is_new = true;
         return made;
       });
+  kept_ = {};
   job_ = entry.job;
   bound_ = true;
   record_.tracker_guid = entry.analysis->tracker_identity();
@@ -208,6 +228,16 @@ boost::shared_ptr<marrow::tracking::AllFeatures> AnalyzerPrem::GetFeatures() {
 void AnalyzerPrem::EndBefore(std::int64_t row) {
   const JobRegistry::Entry entry = FindEntry();
   if (entry.job) entry.job->EndBefore(row);
+}
+
+void AnalyzerPrem::WantPiece() {
+  const JobRegistry::Entry entry = FindEntry();
+  if (IsUnderWay(entry)) entry.analysis->WantPiece();
+}
+
+std::vector<Analysis::Piece> AnalyzerPrem::TakePieces() {
+  const JobRegistry::Entry entry = FindEntry();
+  return entry.analysis ? entry.analysis->TakePieces() : std::vector<Analysis::Piece>();
 }
 
 bool AnalyzerPrem::CanGoOn() {

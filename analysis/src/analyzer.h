@@ -60,6 +60,12 @@ class Analyzer {
   // The job, if there is one, ends before this row of its run (Job::EndBefore), and its table does
   // where the job had done more.
   virtual void EndBefore(std::int64_t row);
+  // Ahead of Start: what was kept of an earlier run, which a job that is new goes on behind if it
+  // is one of the same.
+  virtual void GiveKept(std::vector<Bytes> pieces);
+  // Asks the job for what a later process can go on behind, and gives what is there by now.
+  virtual void WantPiece();
+  virtual std::vector<Analysis::Piece> TakePieces();
 
   // Frames of the clip, of one StepTime each; the end excluded.
   std::int64_t FirstFrame() const;
@@ -109,6 +115,9 @@ class AnalyzerPrem final : public Analyzer {
   boost::shared_ptr<marrow::tracking::AllFeatures> GetFeatures() override;
   bool CanGoOn() override;
   void EndBefore(std::int64_t row) override;
+  void GiveKept(std::vector<Bytes> pieces) override { kept_ = std::move(pieces); }
+  void WantPiece() override;
+  std::vector<Analysis::Piece> TakePieces() override;
 
  private:
   JobRegistry::Key key() const { return {record_.job_guid, source_identity_, plugin_}; }
@@ -117,6 +126,7 @@ class AnalyzerPrem final : public Analyzer {
 
   const HX_Handle plugin_;
   const JobFactory make_job_;
+  std::vector<Bytes> kept_;  // until the start
   // The job that was started or joined. Empty in an analyzer that was read from a project until
   // it finds its job: another effect may have put a new one in its place since.
   boost::weak_ptr<ExecutorJob> job_;

@@ -18,10 +18,11 @@ RunFrames GetRunFrames(const JobInput& input) {
   return run;
 }
 
-JobFrameSource::JobFrameSource(Job& job) : job_(job), run_(GetRunFrames(job.input())) {
-  Prepare(mask_);
-  Prepare(luma_);
-  Prepare(color_);
+JobFrameSource::JobFrameSource(Job& job, std::int64_t first_row)
+    : job_(job), run_(GetRunFrames(job.input())) {
+  Prepare(mask_, first_row);
+  Prepare(luma_, first_row);
+  Prepare(color_, first_row);
 }
 
 JobFrameSource::~JobFrameSource() {
@@ -31,9 +32,9 @@ JobFrameSource::~JobFrameSource() {
   }
 }
 
-void JobFrameSource::Prepare(Reader& reader) {
+void JobFrameSource::Prepare(Reader& reader, std::int64_t first_row) {
   job_.GetFrameSize(&reader.width, &reader.height);
-  for (std::int64_t f = 0; f < std::min<std::int64_t>(2, run_.frame_count); ++f) {
+  for (std::int64_t f = first_row; f < std::min(first_row + 2, run_.frame_count); ++f) {
     job_.RequestFrame(TimeOf(f), kRequestField);
   }
 }
@@ -48,6 +49,29 @@ std::int32_t JobFrameSource::FieldOf(std::int64_t frame) const {
   return 3 - field;
 }
 
+marrow::tracking::ArgbFrame JobFrameSource::Fetch(const Reader& reader, const RationalTime& time) {
+  std::int32_t row_bytes = 0;
+  bool flipped = false;
+  std::uint32_t format = 0;
+  const std::uint8_t* pixels = nullptr;
+  job_.GetFrame(time, kRequestField, &row_bytes, &flipped, &format, &pixels);
+  marrow::tracking::ArgbFrame argb{pixels, row_bytes, width(), height()};
+  if (flipped) {
+    argb.top_row = pixels + static_cast<std::ptrdiff_t>(row_bytes) * (reader.height - 1);
+    argb.row_bytes = -argb.row_bytes;
+  }
+  return argb;
+}
+
+void JobFrameSource::LookBack(std::size_t frame, marrow::tracking::ImagePyramid& pyramid,
+                              std::vector<float>& scratch) {
+  if (job_.GetStatus().state >= JobState::Cancelled) throw TerminateException();
+  const RationalTime time = TimeOf(static_cast<std::int64_t>(frame));
+  job_.RequestFrame(time, kRequestField);
+  images_.ColorPyramid(frame, Fetch(color_, time), pyramid, scratch);
+  job_.ReleaseFrame(time, kRequestField);
+}
+
 template <class Convert>
 void JobFrameSource::Load(Reader& reader, std::size_t frame_index, const Convert& convert) {
   if (job_.GetStatus().state >= JobState::Cancelled) throw TerminateException();
@@ -56,18 +80,8 @@ void JobFrameSource::Load(Reader& reader, std::size_t frame_index, const Convert
   const RationalTime time = TimeOf(frame);
   if (reader.last_frame != frame) Release(reader);
 
-  std::int32_t row_bytes = 0;
-  bool flipped = false;
-  std::uint32_t format = 0;
-  const std::uint8_t* pixels = nullptr;
-  job_.GetFrame(time, kRequestField, &row_bytes, &flipped, &format, &pixels);
+  const marrow::tracking::ArgbFrame argb = Fetch(reader, time);
   reader.last_frame = frame;
-
-  marrow::tracking::ArgbFrame argb{pixels, row_bytes, width(), height()};
-  if (flipped) {
-    argb.top_row = pixels + static_cast<std::ptrdiff_t>(row_bytes) * (reader.height - 1);
-    argb.row_bytes = -argb.row_bytes;
-  }
   convert(argb);
   job_.SetTime(time);
   job_.SetField(FieldOf(frame));

@@ -24,8 +24,8 @@ RunFrames GetRunFrames(const JobInput& input);
 // EndOfRun from a fetch at or behind the job's end row.
 class JobFrameSource final : public marrow::tracking::FrameSource {
  public:
-  // The job outlives it. Orders the first two frames.
-  explicit JobFrameSource(Job& job);
+  // The job outlives it. Orders the first two frames from that row on.
+  explicit JobFrameSource(Job& job, std::int64_t first_row = 0);
   // Drops what ReleaseFrames was not asked to release.
   ~JobFrameSource() override;
 
@@ -41,6 +41,10 @@ class JobFrameSource final : public marrow::tracking::FrameSource {
   void LoadColorPyramid(std::size_t frame, marrow::tracking::ImagePyramid& pyramid,
                         std::vector<float>& scratch) override;
 
+  // Asks for that frame alone.
+  void LookBack(std::size_t frame, marrow::tracking::ImagePyramid& pyramid,
+                std::vector<float>& scratch) override;
+
   // Releases the frames that are still held: colour, luma, mask.
   void ReleaseFrames();
 
@@ -50,7 +54,8 @@ class JobFrameSource final : public marrow::tracking::FrameSource {
     std::int64_t last_frame = -1;  // not released yet; -1 is none
   };
 
-  void Prepare(Reader& reader);
+  void Prepare(Reader& reader, std::int64_t first_row);
+  marrow::tracking::ArgbFrame Fetch(const Reader& reader, const RationalTime& time);
   template <class Convert>
   void Load(Reader& reader, std::size_t frame, const Convert& convert);
   void Release(Reader& reader);

@@ -4,6 +4,7 @@
 
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/plugin_path.h"
+#include "host/project/project_keeper.h"
 #include "host/timeline/source.h"
 
 namespace calmframe {
@@ -48,8 +49,11 @@ std::unique_ptr<host::Film> TakeUp(const std::string& clip, const std::string& p
                                    const host::ShotRequest& shots) {
   CheckOrder(stretch);
   std::error_code error;
-  if (project.empty() || !std::filesystem::exists(project, error)) {
-    return std::make_unique<host::Film>(PluginPath(), clip, opening, PartFor(stretch), shots);
+  const bool is_there = !project.empty() && std::filesystem::exists(project, error);
+  if (!is_there || !host::HoldsWork(project)) {
+    // An analysis that goes on where one was stopped does not decode the clip in order.
+    const host::Opening how = is_there ? host::Opening::decoded : opening;
+    return std::make_unique<host::Film>(PluginPath(), clip, how, PartFor(stretch), shots);
   }
   host::Project saved = host::LoadProject(project);
   if (host::ContentOf(clip) != saved.clip_content) {
@@ -126,6 +130,10 @@ void WorkFile::Throw() const {
 
 void WorkAndLeave(host::Film& film, host::SteadyClip& shot, WorkFile& file,
                   ProgressLine& progress) {
+  if (!file.project().empty()) {
+    const auto first = static_cast<std::int32_t>(shot.range().first);
+    shot.effect().shared()->SetKeeper(std::make_shared<host::ProjectKeeper>(file.project(), first));
+  }
   const host::Reuse reuse = shot.Work(progress);
   if (file.project().empty()) return;
   if (const std::string text = reuse.Text(); !text.empty()) {

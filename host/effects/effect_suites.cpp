@@ -250,6 +250,36 @@ HX_Err GetEnd(HX_EffectRef effect, std::int32_t* frame) {
 
 constexpr HX_AnalysisSpanSuite1 kAnalysisSpan = {GetEnd};
 
+// -- Analysis Keeping --
+
+HX_Err IsWanted(HX_EffectRef effect, std::uint8_t* wanted) {
+  return Tell("Analysis Keeping.IsWanted", effect, wanted,
+              [](TimelineEffect& of, const LayerState&) {
+                return static_cast<std::uint8_t>(of.keeper() && of.keeper()->Wants());
+              });
+}
+
+HX_Err Keep(HX_EffectRef effect, std::uint32_t number, const void* bytes, std::uint64_t size) {
+  return WithInstance("Analysis Keeping.Keep", effect, [&](Host&, Instance& instance) -> HX_Err {
+    const auto& keeper = instance.effect()->keeper();
+    if (keeper) keeper->Keep(number, static_cast<const std::uint8_t*>(bytes), size);
+    return HX_ERR_NONE;
+  });
+}
+
+HX_Err FindPiece(HX_EffectRef effect, std::uint32_t number, const void** bytes,
+                 std::uint64_t* size) {
+  return WithInstance("Analysis Keeping.Find", effect, [&](Host&, Instance& instance) -> HX_Err {
+    const auto& keeper = instance.effect()->keeper();
+    const std::vector<std::uint8_t>* piece = keeper ? keeper->Find(number) : nullptr;
+    *bytes = piece ? piece->data() : nullptr;
+    *size = piece ? piece->size() : 0;
+    return HX_ERR_NONE;
+  });
+}
+
+constexpr HX_AnalysisKeepingSuite1 kAnalysisKeeping = {IsWanted, Keep, FindPiece};
+
 // -- Opaque Effect Data --
 
 HX_Err FindOpaque(std::uint64_t reference, void** block) {
@@ -294,6 +324,7 @@ const void* FindEffectSuite(std::string_view name, std::int32_t version) {
       {HX_BLUR_SUITE, HX_BLUR_SUITE_VERSION, &kBlur},
       {HX_ANALYSIS_HOST_SUITE, HX_ANALYSIS_HOST_SUITE_VERSION, &kAnalysisHost},
       {HX_ANALYSIS_SPAN_SUITE, HX_ANALYSIS_SPAN_SUITE_VERSION, &kAnalysisSpan},
+      {HX_ANALYSIS_KEEPING_SUITE, HX_ANALYSIS_KEEPING_SUITE_VERSION, &kAnalysisKeeping},
       {HX_STABILIZER_HOST_SUITE, HX_STABILIZER_HOST_SUITE_VERSION, &kStabilizerHost},
       {HX_OPAQUE_EFFECT_DATA_SUITE, HX_OPAQUE_EFFECT_DATA_SUITE_VERSION, &kOpaqueEffectData}};
   for (const auto& suite : kSuites) {

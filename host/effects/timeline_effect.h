@@ -13,6 +13,17 @@
 
 namespace calmframe::host {
 
+// Keeps the pieces of an analysis while it is under way, and finds those of an earlier process: see
+// HX_AnalysisKeepingSuite1. None of them throws.
+class AnalysisKeeper {
+ public:
+  virtual ~AnalysisKeeper() = default;
+  virtual bool Wants() noexcept = 0;
+  virtual void Keep(std::size_t number, const std::uint8_t* bytes, std::size_t size) noexcept = 0;
+  // Null behind the last. Good until the next call.
+  virtual const std::vector<std::uint8_t>* Find(std::size_t number) noexcept = 0;
+};
+
 // What all instances of one effect on the timeline share. Any thread.
 class TimelineEffect {
  public:
@@ -33,6 +44,10 @@ class TimelineEffect {
   void AddMessage(const std::string& text) noexcept;
   std::vector<std::string> TakeMessages();
 
+  // Who keeps an analysis that is under way; null: nobody. The session's thread.
+  void SetKeeper(std::shared_ptr<AnalysisKeeper> keeper) { keeper_ = std::move(keeper); }
+  const std::shared_ptr<AnalysisKeeper>& keeper() const { return keeper_; }
+
   // Outline of a frame as its last render told it, x and y of each vertex; empty if none did.
   void SetPolygon(std::int32_t frame, std::vector<float> xy);
   std::vector<float> PolygonOf(std::int32_t frame) const;
@@ -42,6 +57,7 @@ class TimelineEffect {
   const std::uint64_t reference_;
   const std::uint32_t runtime_id_;
   ParamTable params_;
+  std::shared_ptr<AnalysisKeeper> keeper_;
   std::atomic<std::uint64_t> generation_{1};
   mutable std::mutex mutex_;
   std::vector<std::string> messages_;                    // guarded by mutex_

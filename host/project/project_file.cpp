@@ -10,6 +10,7 @@
 #include "host/media/clip_files.h"
 #include "host/media/frame_index.h"
 #include "host/project/project_format.h"
+#include "host/project/project_keeper.h"
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
 
@@ -91,6 +92,7 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   // For writing, since an interrupted save is first taken back; SQLite does without where it must.
   SqliteDatabase database(path, SQLITE_OPEN_READWRITE);
   const std::int64_t version = CheckedVersion(path, database);
+  if (!HoldsWork(path)) Fail(path, "holds an analysis that was stopped, and no work yet");
   Project project;
   ReadSettings(database, version, project);
   if (version < 5) {

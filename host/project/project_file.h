@@ -83,6 +83,9 @@ class ProjectSaver {
   std::optional<Standing> standing_;
 };
 
+// A file of saved work that has none yet. Throws ProjectFailure.
+void CreateWithoutWork(const std::string& path);
+
 // Throws ProjectFailure: not there or not readable, no project, damaged, of a newer version, too
 // large, which is found before it is read.
 Project LoadProject(const std::string& path, std::size_t most = kMaximumInstanceBytes);

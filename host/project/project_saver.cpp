@@ -24,6 +24,7 @@ using tessel::utility::Guid;
 constexpr char kDrop[] =
     "DROP TABLE IF EXISTS setting; DROP TABLE IF EXISTS parameter; DROP TABLE IF EXISTS instance;"
     "DROP TABLE IF EXISTS frames; DROP TABLE IF EXISTS shot;";
+constexpr char kDropPieces[] = "DROP TABLE IF EXISTS analysis";  // of ProjectKeeper's
 constexpr char kCreate[] =
     "CREATE TABLE setting (key TEXT PRIMARY KEY, value) WITHOUT ROWID;"
     "CREATE TABLE shot (number INTEGER PRIMARY KEY, start_frame INTEGER NOT NULL,"
@@ -31,6 +32,10 @@ constexpr char kCreate[] =
     "CREATE TABLE parameter (shot INTEGER, disk_id INTEGER, value REAL NOT NULL,"
     " PRIMARY KEY (shot, disk_id)) WITHOUT ROWID;"
     "CREATE TABLE frames (id INTEGER PRIMARY KEY CHECK (id = 1), bytes BLOB NOT NULL);"
+    "PRAGMA application_id = 1130458221; PRAGMA user_version = 6;";
+constexpr char kCreateWithoutWork[] =
+    "CREATE TABLE analysis (start_frame INTEGER, number INTEGER, bytes BLOB NOT NULL,"
+    " PRIMARY KEY (start_frame, number)) WITHOUT ROWID;"
     "PRAGMA application_id = 1130458221; PRAGMA user_version = 6;";
 static_assert(kProjectVersion == 6);
 
@@ -85,9 +90,9 @@ void Sync(const fs::path& place) {
   close(file);
 }
 
-// A new file gets its name when it is whole. write(database) fills its tables.
-template <class WriteAll>
-void Create(const fs::path& path, const WriteAll& write) {
+// A new file gets its name when it is whole. fill(database) makes and fills its tables.
+template <class Fill>
+void Create(const fs::path& path, const Fill& fill) {
   std::string temporary = path.parent_path() / ".";
   temporary += path.filename().string();
   temporary += ".XXXXXX";
@@ -98,8 +103,7 @@ void Create(const fs::path& path, const WriteAll& write) {
     {
       SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
       database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
-      database.Run(kCreate);
-      write(database);
+      fill(database);
       database.Run("COMMIT");
     }
     chmod(temporary.c_str(), 0644);
@@ -154,17 +158,30 @@ void ProjectSaver::Save(const Project& project, std::size_t changed) try {
       database.Run(kDrop);
       database.Run(kCreate);
     }
+    database.Run(kDropPieces);
     Write(database, project, places, is_known ? rows : all, now.whole);
     database.Run("COMMIT");
   } else {
-    Create(place,
-           [&](SqliteDatabase& database) { Write(database, project, places, all, now.whole); });
+    Create(place, [&](SqliteDatabase& database) {
+      database.Run(kCreate);
+      Write(database, project, places, all, now.whole);
+    });
   }
   standing_ = std::move(now);
 } catch (const SqliteError& error) {
   Fail(path_, error);
 } catch (const fs::filesystem_error& error) {
   Fail(path_, error.code().message());
+}
+
+void CreateWithoutWork(const std::string& path) try {
+  std::error_code error;
+  Create(fs::weakly_canonical(fs::absolute(path), error),
+         [](SqliteDatabase& database) { database.Run(kCreateWithoutWork); });
+} catch (const SqliteError& error) {
+  Fail(path, error);
+} catch (const fs::filesystem_error& error) {
+  Fail(path, error.code().message());
 }
 
 }  // namespace calmframe::host

@@ -22,6 +22,7 @@ ShotSource::ShotSource(SourcePtr source, const media::FrameRange& range,
       borders_(std::move(borders).value_or(std::vector<ShotBorder>())) {}
 
 PicturePtr ShotSource::Fetch(std::int64_t frame, PixelKind kind) {
+  if (looks_ && kind == PixelKind::argb8) CatchUp(frame);
   PicturePtr picture = source_->Fetch(frame, kind);
   if (!looks_ || !picture || kind != PixelKind::argb8) return picture;
   {
@@ -30,6 +31,23 @@ PicturePtr ShotSource::Fetch(std::int64_t frame, PixelKind kind) {
   }
   Look(frame, DigestOf(ViewOf(*picture)));
   return picture;
+}
+
+void ShotSource::CatchUp(std::int64_t frame) {
+  constexpr std::int64_t kAhead = 16;  // more than an analysis asks ahead
+  const std::int64_t last = std::min(frame, static_cast<std::int64_t>(range_.end));
+  const std::lock_guard alone(catching_up_);
+  while (true) {
+    std::int64_t next;
+    {
+      const std::lock_guard lock(mutex_);
+      next = next_;
+    }
+    if (last - next <= kAhead) return;
+    const PicturePtr picture = source_->Fetch(next, PixelKind::argb8);
+    if (!picture) return;
+    Look(next, DigestOf(ViewOf(*picture)));
+  }
 }
 
 void ShotSource::Look(std::int64_t frame, const FrameDigest& digest) {

@@ -31,10 +31,13 @@ class ShotSource final : public Source {
 
  private:
   void Look(std::int64_t frame, const FrameDigest& digest);
+  // An analysis that goes on where an earlier process left it does not ask for what that has seen.
+  void CatchUp(std::int64_t frame);
 
   const SourcePtr source_;
   const media::FrameRange range_;
   const bool looks_;
+  std::mutex catching_up_;
   mutable std::mutex mutex_;  // guards all below
   ShotFinder finder_;
   std::int64_t next_;                            // frame that the finder is to have

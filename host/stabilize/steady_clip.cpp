@@ -538,10 +538,13 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
   }
   Effect* best = nullptr;
   const auto stops = [&] { return watcher.Stops(); };
-  // Two at a time, whatever the machine: each holds the tracks and warps of the whole clip.
-  for (std::size_t first = 0; first < trials.size(); first += 2) {
+  // Whatever the machine, two at a time, and of a long clip one: each holds the tracks and warps of
+  // the whole clip.
+  constexpr std::size_t kLong = 3000;  // frames
+  const std::size_t at_once = range_.size() < kLong ? 2 : 1;
+  for (std::size_t first = 0; first < trials.size(); first += at_once) {
     std::vector<std::pair<const Trial*, Effect*>> copies;
-    for (std::size_t t = first; t < std::min(first + 2, trials.size()); ++t) {
+    for (std::size_t t = first; t < std::min(first + at_once, trials.size()); ++t) {
       SavedEffect changed = saved;
       changed.values[trials[t]->disk_id] = trials[t]->value;
       copies.emplace_back(trials[t], &session_.Load(LayerOfItsOwn(), changed));
@@ -563,7 +566,7 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
       if (!is_best) session_.Remove(*copy);
     }
     watcher.Show({.stage = "choosing",
-                  .done = static_cast<double>(std::min(first + 2, trials.size())) /
+                  .done = static_cast<double>(std::min(first + at_once, trials.size())) /
                           static_cast<double>(trials.size()),
                   .total = 1});
     if (watcher.Stops()) {

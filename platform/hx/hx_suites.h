@@ -114,6 +114,23 @@ typedef struct HX_AnalysisSpanSuite1 {
   HX_Err (*GetEnd)(HX_EffectRef effect, int32_t* frame);
 } HX_AnalysisSpanSuite1;
 
+#define HX_ANALYSIS_KEEPING_SUITE "Analysis Keeping Suite"
+#define HX_ANALYSIS_KEEPING_SUITE_VERSION 1
+/* Offered by hosts that keep an analysis while it is under way, so that what a process leaves
+   unfinished another one goes on with. Pieces are the effect's own, one behind the other; a host
+   keeps whole ones. */
+typedef struct HX_AnalysisKeepingSuite1 {
+  /* UI; in every tick of an analysis that runs. 1: the host will have a piece; it comes some ticks
+     later. */
+  HX_Err (*IsWanted)(HX_EffectRef effect, uint8_t* wanted);
+  /* UI. Piece `number`, from 0. Of those that are kept any from that number on go. */
+  HX_Err (*Keep)(HX_EffectRef effect, uint32_t number, const void* bytes, uint64_t size);
+  /* UI; as an analysis begins. Piece `number` of what was kept on the effect's layer, good until
+     the effect's call ends; null behind the last. The effect passes over what is of something else,
+     or damaged. */
+  HX_Err (*Find)(HX_EffectRef effect, uint32_t number, const void** bytes, uint64_t* size);
+} HX_AnalysisKeepingSuite1;
+
 #define HX_STABILIZER_HOST_SUITE "Stabilizer Host Suite"
 #define HX_STABILIZER_HOST_SUITE_VERSION 7
 typedef struct HX_StabilizerHostSuite7 {

@@ -66,16 +66,16 @@ void cropper::cropper_smooth_rects(bool bilateral, float sigma, float bilateral_
   cropHeight = size.height;
 }
 
-boost::shared_ptr<cropper> RunCropper(const SolverParamsRecord& parameters,
-                                      const std::vector<boost::shared_ptr<const VarVector>>& warps,
-                                      const frame_bounds& unionBounds, bool boundsEmpty,
-                                      const progress_functor& progress) {
+boost::shared_ptr<cropper> RunCropper(
+    const SolverParamsRecord& parameters, std::size_t frameCount,
+    const std::function<boost::shared_ptr<const VarVector>(std::size_t)>& warp_of,
+    const frame_bounds& unionBounds, bool boundsEmpty, const progress_functor& progress) {
   const auto result =
-      boost::make_shared<cropper>(warps.size(), mask_size(unionBounds.max_x - unionBounds.min_x),
+      boost::make_shared<cropper>(frameCount, mask_size(unionBounds.max_x - unionBounds.min_x),
                                   mask_size(unionBounds.max_y - unionBounds.min_y));
   if (boundsEmpty) return result;
-  for (std::size_t f = 0; f < warps.size(); ++f) {
-    result->computeFrameRect(f, *warps[f], {unionBounds.min_x, unionBounds.min_y},
+  for (std::size_t f = 0; f < frameCount; ++f) {
+    result->computeFrameRect(f, *warp_of(f), {unionBounds.min_x, unionBounds.min_y},
                              parameters.use_frame_bounds);
     progress();
   }

@@ -2,6 +2,7 @@
 
 #include <boost/shared_ptr.hpp>
 #include <cstdint>
+#include <functional>
 #include <vector>
 
 #include "stabilization/progress.h"
@@ -52,10 +53,11 @@ boost::shared_ptr<cropper> RunCropper(const marrow::stabilization::SolverParamsR
                                       const marrow::stabilization::CPWarper& warper,
                                       const marrow::stabilization::progress_functor& progress);
 
-// The same over plain records: `warps` one a frame, `unionBounds` and `boundsEmpty` as the warper
-// has them.
+// The same over plain records: `warp_of` a frame, `unionBounds` and `boundsEmpty` as the warper has
+// them.
 boost::shared_ptr<cropper> RunCropper(
-    const marrow::stabilization::SolverParamsRecord& parameters,
-    const std::vector<boost::shared_ptr<const marrow::stabilization::VarVector>>& warps,
+    const marrow::stabilization::SolverParamsRecord& parameters, std::size_t frameCount,
+    const std::function<boost::shared_ptr<const marrow::stabilization::VarVector>(std::size_t)>&
+        warp_of,
     const marrow::stabilization::frame_bounds& unionBounds, bool boundsEmpty,
     const marrow::stabilization::progress_functor& progress);

@@ -50,6 +50,20 @@ void include(frame_bounds& bounds, point2 p) {
   if (p.y > bounds.max_y) bounds.max_y = p.y;
 }
 
+// Of the outer ring of vertices.
+frame_bounds outline_bounds(const VarVector& grid) {
+  frame_bounds bounds = kNothing;
+  for (std::int32_t c = 0; c < grid.cols; ++c) {
+    include(bounds, grid.vertex(c, 0));
+    include(bounds, grid.vertex(c, grid.rows - 1));
+  }
+  for (std::int32_t r = 0; r < grid.rows; ++r) {
+    include(bounds, grid.vertex(0, r));
+    include(bounds, grid.vertex(grid.cols - 1, r));
+  }
+  return bounds;
+}
+
 }  // namespace
 
 warp_grid::warp_grid(std::int32_t frameWidth, std::int32_t frameHeight)
@@ -83,38 +97,44 @@ void CPWarper::buildDisplacements(boost::shared_ptr<const stabilizer_global> sta
   homographyLimit_ = parameters.homography_limit;
   global_ = std::move(stabilizerGlobal);
   solving_ = nullptr;
-  *frameDisplacements_ =
-      blended_displacements(*global_, factorizationWindows, parameters, progress);
-  frameDisplacements_->resize(static_cast<std::size_t>(frameCount_));
+  tracks_ = boost::make_shared<const blended_tracks>(*global_, factorizationWindows, parameters,
+                                                     progress);
   progress();
-  computeModelScores(factorizationWindows, transitionWindows, parameters.method_level);
-  progress();
-  limitByDeviation(progress);
-  progress();
-  limitByHomographySanity(progress);
+  computeModelScores(factorizationWindows, transitionWindows, parameters.method_level, progress);
 }
 
 void CPWarper::buildDisplacementsForWindows(stabilizer_global& stabilizerGlobal,
                                             const std::vector<factorization_window>& windows,
                                             const SolverParamsRecord& parameters) {
   solving_ = &stabilizerGlobal;
-  *frameDisplacements_ = member_displacements(stabilizerGlobal, windows, parameters);
-  frameDisplacements_->resize(static_cast<std::size_t>(frameCount_));
+  windowLists_ = member_displacements(stabilizerGlobal, windows, parameters);
+  windowLists_.resize(static_cast<std::size_t>(frameCount_));
+}
+
+std::vector<Displacement> CPWarper::displacements(std::size_t frame) const {
+  if (solving_) return windowLists_[frame];
+  if (!tracks_) return {};
+  std::vector<Displacement> list = robust_walk(*tracks_, kOutlierRampFrames, frame).next().list;
+  if (driven_) {
+    locateInRestGrid(list);
+    moveSources(list, bases_[frame], gridUnder(bases_[frame]));
+  }
+  return list;
 }
 
 void CPWarper::pruneDisplacements(std::int32_t lastFrame) {
-  refresh_targets(*frameDisplacements_, *solving_, std::max(lastFrame - kOutlierRampFrames, 0),
+  refresh_targets(windowLists_, *solving_, std::max(lastFrame - kOutlierRampFrames, 0),
                   lastFrame + 1);
 }
 
 void CPWarper::reweightRecent(std::int32_t lastFrame) {
   const std::int32_t first = std::max(lastFrame - kOutlierRampFrames, 0);
-  for (std::int32_t f = first; f <= lastFrame; ++f) medianDeviation((*frameDisplacements_)[f]);
-  fade_about_outliers(*frameDisplacements_, first, lastFrame + 1, kOutlierRampFrames);
+  for (std::int32_t f = first; f <= lastFrame; ++f) medianDeviation(windowLists_[f]);
+  fade_about_outliers(windowLists_, first, lastFrame + 1, kOutlierRampFrames);
 }
 
 void CPWarper::projectFrame(std::int32_t frame, bool translationOnly) {
-  const std::vector<Displacement>& list = (*frameDisplacements_)[frame];
+  const std::vector<Displacement>& list = windowLists_[frame];
   if (list.size() < kLeastForProjection) {
     throw std::runtime_error("Not enough features for computing similarity transform");
   }
@@ -130,8 +150,7 @@ void CPWarper::projectFrame(std::int32_t frame, bool translationOnly) {
   }
 }
 
-matrix3 CPWarper::fitKind(std::size_t frame, int kind) {
-  const std::vector<Displacement>& list = (*frameDisplacements_)[frame];
+matrix3 CPWarper::fitKind(std::size_t frame, const std::vector<Displacement>& list, int kind) {
   switch (kind) {
     case 1: {
       tessel::debug::Log("translation ");
@@ -152,29 +171,29 @@ matrix3 CPWarper::fitKind(std::size_t frame, int kind) {
   }
 }
 
-CPWarper::frame_model CPWarper::chooseModel(std::size_t frame) {
+CPWarper::frame_model CPWarper::chooseModel(std::size_t frame,
+                                            const std::vector<Displacement>& list) {
   const double score = modelScore_[frame];
   const double fraction = score - std::floor(score);
   const bool whole = fraction < kWholeScore || fraction > 1 - kWholeScore;
   const int kind = static_cast<int>(std::floor(score + kWholeScore));
-  tessel::debug::Log(
-      "frame %d: displacements %d, models %d, score %1.2f: ", static_cast<int>(frame),
-      static_cast<int>((*frameDisplacements_)[frame].size()), whole ? 1 : 2, score);
+  tessel::debug::Log("frame %d: displacements %d, models %d, score %1.2f: ",
+                     static_cast<int>(frame), static_cast<int>(list.size()), whole ? 1 : 2, score);
   const double share = whole ? 0 : score - kind;
   const int most_complex = whole ? kind : kind + 1;
 
   frame_model model;
-  model.base = fitKind(frame, kind);
+  model.base = fitKind(frame, list, kind);
   if (most_complex >= 4) {
     // The models 3 and 4 have the same base, so the blend of their bases is that base.
     if (!whole) tessel::debug::Log("cp warp ");
-    if (suffices(model.base, (*frameDisplacements_)[frame])) {
+    if (suffices(model.base, list)) {
       tessel::debug::Log("but homography suffices, switching");
     } else {
       model.solved_share = whole ? 1 : share;
     }
   } else if (!whole) {
-    const matrix3 upper = fitKind(frame, most_complex);
+    const matrix3 upper = fitKind(frame, list, most_complex);
     for (std::size_t i = 0; i < 8; ++i) model.base[i] += (upper[i] - model.base[i]) * share;
     model.base[8] = 1.0;
   }
@@ -203,14 +222,14 @@ void CPWarper::moveSources(std::vector<Displacement>& list, const matrix3& base,
   }
 }
 
-boost::shared_ptr<VarVector> CPWarper::gridUnder(const matrix3& m) const {
-  auto grid = boost::make_shared<VarVector>(grid_.cols, grid_.rows);
+VarVector CPWarper::gridUnder(const matrix3& m) const {
+  VarVector grid(grid_.cols, grid_.rows);
   std::size_t i = 0;
   for (std::int32_t r = 0; r < grid_.rows; ++r) {
     for (std::int32_t c = 0; c < grid_.cols; ++c, i += 2) {
       const point2 p = transform(m, {c * grid_.cellWidth, r * grid_.cellHeight});
-      grid->values[i] = p.x;
-      grid->values[i + 1] = p.y;
+      grid.values[i] = p.x;
+      grid.values[i + 1] = p.y;
     }
   }
   return grid;
@@ -218,66 +237,73 @@ boost::shared_ptr<VarVector> CPWarper::gridUnder(const matrix3& m) const {
 
 void CPWarper::drive(const progress_functor& progress) {
   grid_solver solver(grid_.cols, grid_.rows);
-  frameWarps_.reserve(static_cast<std::size_t>(frameCount_));
+  robust_walk walk(*tracks_, kOutlierRampFrames);
+  frameWarps_->reserve(static_cast<std::size_t>(frameCount_));
+  bases_.reserve(static_cast<std::size_t>(frameCount_));
+  VarVector solved(grid_.cols, grid_.rows);
   for (std::size_t f = 0; f < static_cast<std::size_t>(frameCount_); ++f) {
-    std::vector<Displacement>& list = (*frameDisplacements_)[f];
-    const frame_model model = chooseModel(f);
+    std::vector<Displacement> list = walk.next().list;
+    const frame_model model = chooseModel(f, list);
     progress();
-    boost::shared_ptr<VarVector> record = gridUnder(model.base);
+    VarVector record = gridUnder(model.base);
     locateInRestGrid(list);
-    moveSources(list, model.base, *record);
+    moveSources(list, model.base, record);
     progress();
     if (model.solved_share > 0) {
       // Zero where the solve fails; a blend then still goes towards it.
-      auto solved = boost::make_shared<VarVector>(grid_.cols, grid_.rows);
-      solver.solve(list, record->values, dataWeight_, solved->values);
+      std::fill(solved.values.begin(), solved.values.end(), 0.0);
+      solver.solve(list, record.values, dataWeight_, solved.values);
       progress();
       if (model.solved_share == 1) {
-        record = solved;
+        record.values = solved.values;
       } else {
-        for (std::size_t i = 0; i < record->values.size(); ++i) {
-          record->values[i] += (solved->values[i] - record->values[i]) * model.solved_share;
+        for (std::size_t i = 0; i < record.values.size(); ++i) {
+          record.values[i] += (solved.values[i] - record.values[i]) * model.solved_share;
         }
       }
     }
-    storeFrameWarp(record, true);
+    storeFrameWarp(record);
+    bases_.push_back(model.base);
     progress();
   }
   driven_ = true;
 }
 
-void CPWarper::storeFrameWarp(boost::shared_ptr<VarVector> record, bool quantise_first) {
-  if (quantise_first) *record = rebuild(quantise(*record), record->cols, record->rows);
-  frameWarps_.push_back(std::move(record));
-  const frame_bounds bounds = frameBounds(frameWarps_.size() - 1);
+void CPWarper::storeFrameWarp(const VarVector& record) {
+  append(quantise(record), record.cols, record.rows);
+}
+
+void CPWarper::storeFrameWarp(const quantised_warp& record) {
+  append(record, grid_.cols, grid_.rows);
+}
+
+void CPWarper::append(const quantised_warp& record, std::int32_t cols, std::int32_t rows) {
+  auto expanded = boost::make_shared<const VarVector>(rebuild(record, cols, rows));
+  const frame_bounds bounds = outline_bounds(*expanded);
+  frameWarps_->push_back({pack(record, cols, rows), cols, rows, bounds});
+  if (!firstWarp_) firstWarp_ = std::move(expanded);
   unionBounds_.min_x = std::min(unionBounds_.min_x, bounds.min_x);
   unionBounds_.min_y = std::min(unionBounds_.min_y, bounds.min_y);
   unionBounds_.max_x = std::max(unionBounds_.max_x, bounds.max_x);
   unionBounds_.max_y = std::max(unionBounds_.max_y, bounds.max_y);
 }
 
-const boost::shared_ptr<const VarVector>& CPWarper::frameWarp(std::size_t frame) const {
-  if (frame >= frameWarps_.size()) throw std::out_of_range("invalid vector<T> subscript");
-  return frameWarps_[frame];
+quantised_warp CPWarper::storedWarp(std::size_t frame) const {
+  if (frame >= frameWarps_->size()) throw std::out_of_range("invalid vector<T> subscript");
+  const stored_frame& stored = (*frameWarps_)[frame];
+  return unpack(stored.warp, stored.cols, stored.rows);
 }
 
-frame_bounds CPWarper::frameBounds(std::size_t frame) const {
-  const VarVector& grid = *frameWarp(frame);
-  frame_bounds bounds = kNothing;
-  for (std::int32_t c = 0; c < grid.cols; ++c) {
-    include(bounds, grid.vertex(c, 0));
-    include(bounds, grid.vertex(c, grid.rows - 1));
-  }
-  for (std::int32_t r = 0; r < grid.rows; ++r) {
-    include(bounds, grid.vertex(0, r));
-    include(bounds, grid.vertex(grid.cols - 1, r));
-  }
-  return bounds;
+boost::shared_ptr<const VarVector> CPWarper::frameWarp(std::size_t frame) const {
+  if (frame == 0 && firstWarp_) return firstWarp_;
+  const quantised_warp record = storedWarp(frame);
+  const stored_frame& stored = (*frameWarps_)[frame];
+  return boost::make_shared<const VarVector>(rebuild(record, stored.cols, stored.rows));
 }
 
 bool CPWarper::boundsEmpty() const {
   frame_bounds common = kNothing;
-  for (std::size_t f = 0; f < frameWarps_.size(); ++f) {
+  for (std::size_t f = 0; f < frameWarps_->size(); ++f) {
     const frame_bounds bounds = frameBounds(f);
     if (f == 0) common = bounds;
     common.min_x = std::max(common.min_x, bounds.min_x);

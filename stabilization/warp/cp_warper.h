@@ -98,24 +98,26 @@ class CPWarper {
   double cellWidth() const { return grid_.cellWidth; }
   double cellHeight() const { return grid_.cellHeight; }
 
-  // After drive() the sources are the images under the frame's base matrix. Empty in a warper that
-  // was read from a project.
-  const std::vector<Displacement>& displacements(std::size_t frame) const {
-    return (*frameDisplacements_)[frame];
-  }
+  // Behind the robust pass, made anew at each call. After drive() the sources are the images under
+  // the frame's base matrix. Empty in a warper that was read from a project.
+  std::vector<Displacement> displacements(std::size_t frame) const;
   double modelScore(std::size_t frame) const { return modelScore_[frame]; }
 
-  // Appends a record; with quantise set it is first rounded to 1/256 pixel about its corners'
-  // plane.
-  void storeFrameWarp(boost::shared_ptr<VarVector> record, bool quantise);
-  // Throws std::out_of_range "invalid vector<T> subscript" at or past the end.
-  const boost::shared_ptr<const VarVector>& frameWarp(std::size_t frame) const;
-  std::size_t frameWarpCount() const { return frameWarps_.size(); }
+  // Appends a record, which is rounded to 1/256 pixel about its corners' plane.
+  void storeFrameWarp(const VarVector& record);
+  // Appends exactly this one.
+  void storeFrameWarp(const quantised_warp& record);
+  // Records are kept packed and expanded for who asks; that of frame 0 is kept, so that its address
+  // tells one solve from the next. Throws std::out_of_range "invalid vector<T> subscript" at or
+  // past the end. Any thread.
+  boost::shared_ptr<const VarVector> frameWarp(std::size_t frame) const;
+  quantised_warp storedWarp(std::size_t frame) const;
+  std::size_t frameWarpCount() const { return frameWarps_->size(); }
 
   // Of the frame's outer ring of vertices. A maximum is at least the smallest normal 32-bit float,
   // also for a frame that lies at negative coordinates; vertices that are not numbers are passed
   // over.
-  frame_bounds frameBounds(std::size_t frame) const;
+  frame_bounds frameBounds(std::size_t frame) const { return frameWarps_->at(frame).bounds; }
   // The union over all frames. Kept up by storeFrameWarp, so reading it is safe from any thread.
   const frame_bounds& unionBounds() const { return unionBounds_; }
   // True when the frames' bounds have no common box of at least one pixel.
@@ -132,18 +134,20 @@ class CPWarper {
 
   void computeModelScores(const std::vector<factorization_window>& windows,
                           const std::vector<transition_record>& transitionWindows,
-                          double methodLevel);
-  void limitByDeviation(const progress_functor& progress);
-  void limitByHomographySanity(const progress_functor& progress);
-  void checkConsistency(std::size_t frame) const;
+                          double methodLevel, const progress_functor& progress);
+  static void checkConsistency(std::size_t frame, const std::vector<Displacement>& list,
+                               const matrix3& stored);
   matrix3 storedSimilarity(std::size_t frame) const;
+  void append(const quantised_warp& record, std::int32_t cols, std::int32_t rows);
 
-  frame_model chooseModel(std::size_t frame);
-  matrix3 fitKind(std::size_t frame, int kind);
+  frame_model chooseModel(std::size_t frame, const std::vector<Displacement>& list);
+  matrix3 fitKind(std::size_t frame, const std::vector<Displacement>& list, int kind);
   void locateInRestGrid(std::vector<Displacement>& list) const;
   void moveSources(std::vector<Displacement>& list, const matrix3& base,
                    const VarVector& base_grid) const;
-  boost::shared_ptr<VarVector> gridUnder(const matrix3& m) const;
+  VarVector gridUnder(const matrix3& m) const;
+  bool alignFrameMtoN(std::int32_t M, std::int32_t N, const std::vector<Displacement>& list,
+                      const VarVector& warp, matrix3& output_n_from_source_m) const;
 
   const std::int32_t frameCount_;
   const std::int32_t frameWidth_;
@@ -152,9 +156,8 @@ class CPWarper {
 
   boost::shared_ptr<const stabilizer_global> global_;
   stabilizer_global* solving_ = nullptr;  // set by buildDisplacementsForWindows alone
-  // Shared with the warpers that withFrameMap makes, none of which write it.
-  boost::shared_ptr<displacement_lists> frameDisplacements_ =
-      boost::make_shared<displacement_lists>();
+  boost::shared_ptr<const blended_tracks> tracks_;
+  displacement_lists windowLists_;  // of buildDisplacementsForWindows
   std::vector<double> modelScore_;
   std::vector<bool> overrideFlags_;     // the frame's similarity is stored, not to be fitted
   std::vector<double> overrideParams_;  // four a frame: scale, angle, tx, ty
@@ -162,8 +165,17 @@ class CPWarper {
   double dataWeight_ = 1.0;
   homography_fitter homography_;
   bool driven_ = false;
+  std::vector<matrix3> bases_;  // of the frames' models, once driven
 
-  std::vector<boost::shared_ptr<const VarVector>> frameWarps_;
+  struct stored_frame {
+    packed_warp warp;
+    std::int32_t cols, rows;
+    frame_bounds bounds;
+  };
+  // Shared with the warpers that withFrameMap makes, none of which write it.
+  boost::shared_ptr<std::vector<stored_frame>> frameWarps_ =
+      boost::make_shared<std::vector<stored_frame>>();
+  boost::shared_ptr<const VarVector> firstWarp_;
   frame_bounds unionBounds_;
   boost::shared_ptr<const MtoNMap> frameMap_;
 };

@@ -9,6 +9,7 @@
 
 #include "platform/tessel/debug.h"
 #include "stabilization/models/motion_fits.h"
+#include "stabilization/models/robust_pass.h"
 #include "stabilization/warp/cp_warper.h"
 
 namespace marrow::stabilization {
@@ -35,8 +36,14 @@ bool CPWarper::alignFrameMtoN(std::int32_t M, std::int32_t N,
     throw std::runtime_error(
         "alignFrameMtoN can't be called because CPWarper needs drive() called first");
   }
-  if (N < 0 || N >= frameCount_ || (*frameDisplacements_)[N].empty()) return false;
-  const std::vector<Displacement>& all = (*frameDisplacements_)[N];
+  if (N < 0 || N >= frameCount_) return false;
+  const auto frame = static_cast<std::size_t>(N);
+  return alignFrameMtoN(M, N, displacements(frame), *frameWarp(frame), output_n_from_source_m);
+}
+
+bool CPWarper::alignFrameMtoN(std::int32_t M, std::int32_t N, const std::vector<Displacement>& all,
+                              const VarVector& warp, matrix3& output_n_from_source_m) const {
+  if (all.empty()) return false;
   std::vector<Displacement> shared = all;
   for (std::size_t i = 0; i < shared.size();) {
     Displacement& d = shared[i];
@@ -48,7 +55,7 @@ bool CPWarper::alignFrameMtoN(std::int32_t M, std::int32_t N,
     const track_sample& source = global_->input_at(M, d.track->feature);
     d.sourceX = source.x;
     d.sourceY = source.y;
-    const point2 target = sample_grid(*frameWarps_[N], d);
+    const point2 target = sample_grid(warp, d);
     d.targetX = target.x;
     d.targetY = target.y;
     ++i;
@@ -75,14 +82,35 @@ bool CPWarper::alignFrameMtoN(std::int32_t M, std::int32_t N,
 bool CPWarper::warpedGridOfFrame(std::int32_t M, std::int32_t N, std::vector<double>& grid) const {
   matrix3 m;
   if (!(frameMap_ ? frameMap_->lookup(M, N, m) : driven_ && alignFrameMtoN(M, N, m))) return false;
-  grid = gridUnder(m)->values;
+  grid = gridUnder(m).values;
   return true;
 }
 
 void CPWarper::makeFrameMap(std::uint32_t radius, const progress_functor& progress) {
   constexpr std::uint32_t kMost = std::numeric_limits<std::int32_t>::max();
-  frameMap_ = boost::make_shared<const MtoNMap>(
-      frameCount_, static_cast<std::int32_t>(std::min(radius, kMost)), *this, progress);
+  const auto wanted = static_cast<std::int32_t>(std::min(radius, kMost));
+  // No pair lies further apart than the clip is long.
+  const std::int32_t reach = std::min(wanted, frameCount_);
+  MtoNMap::entries_t entries;
+  if (reach > 0) {
+    robust_walk walk(*tracks_, kOutlierRampFrames);
+    for (std::int32_t n = 0; n < frameCount_; ++n) {
+      progress();
+      const auto frame = static_cast<std::size_t>(n);
+      std::vector<Displacement> list = walk.next().list;
+      locateInRestGrid(list);
+      moveSources(list, bases_[frame], gridUnder(bases_[frame]));
+      const boost::shared_ptr<const VarVector> warp = frameWarp(frame);
+      const std::int32_t last = std::min(n + reach, frameCount_ - 1);
+      for (std::int32_t m = std::max(n - reach, 0); m <= last; ++m) {
+        matrix3 motion;
+        if (m != n && alignFrameMtoN(m, n, list, *warp, motion)) {
+          entries.emplace(std::pair(m, n), motion);
+        }
+      }
+    }
+  }
+  frameMap_ = boost::make_shared<const MtoNMap>(frameCount_, wanted, std::move(entries));
 }
 
 boost::shared_ptr<CPWarper> CPWarper::withFrameMap(std::uint32_t radius,
@@ -90,23 +118,6 @@ boost::shared_ptr<CPWarper> CPWarper::withFrameMap(std::uint32_t radius,
   const boost::shared_ptr<CPWarper> warper(new CPWarper(*this));
   if (driven_) warper->makeFrameMap(radius, progress);
   return warper;
-}
-
-MtoNMap::MtoNMap(std::int32_t frameCount, std::int32_t radius, const CPWarper& warper,
-                 const progress_functor& progress)
-    : frameCount_(frameCount), radius_(radius) {
-  // No pair lies further apart than the clip is long.
-  const std::int32_t reach = std::min(radius, frameCount);
-  for (std::int32_t m = 0; m < frameCount; ++m) {
-    if (reach > 0) progress();
-    const std::int32_t last = std::min(m + reach, frameCount - 1);
-    for (std::int32_t n = std::max(m - reach, 0); n <= last; ++n) {
-      matrix3 motion;
-      if (n != m && warper.alignFrameMtoN(m, n, motion)) {
-        entries_.emplace_hint(entries_.end(), std::pair(m, n), motion);
-      }
-    }
-  }
 }
 
 MtoNMap::MtoNMap(std::int32_t frameCount, std::int32_t radius, entries_t entries)

@@ -5,11 +5,8 @@
 #include <utility>
 
 #include "stabilization/models/matrix3.h"
-#include "stabilization/progress.h"
 
 namespace marrow::stabilization {
-
-class CPWarper;
 
 // The motions from a source frame M to the output of a nearby frame N, all fitted at the end of a
 // solve so that renders need no tracks. Read-only once built, from any thread.
@@ -18,11 +15,7 @@ class MtoNMap {
   // (M, N), ordered by M and then N.
   using entries_t = std::map<std::pair<std::int32_t, std::int32_t>, matrix3>;
 
-  // Every pair at most radius frames apart that has enough tracks in common. The warper must have
-  // been driven in this process. A progress call goes ahead of each frame.
-  MtoNMap(std::int32_t frameCount, std::int32_t radius, const CPWarper& warper,
-          const progress_functor& progress);
-  // As read from a project.
+  // Made by CPWarper::makeFrameMap, or read from a project.
   MtoNMap(std::int32_t frameCount, std::int32_t radius, entries_t entries);
 
   // False when M equals N or where there is no entry.

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdlib>
+#include <limits>
+#include <map>
 #include <stdexcept>
 
 #include "platform/tessel/debug.h"
@@ -37,9 +39,8 @@ void ramp_scores(std::span<double> scores, std::int32_t ramp_frames) {
 
 void CPWarper::computeModelScores(const std::vector<factorization_window>& windows,
                                   const std::vector<transition_record>& transitionWindows,
-                                  double methodLevel) {
+                                  double methodLevel, const progress_functor& progress) {
   const auto frames = static_cast<std::size_t>(frameCount_);
-  modelScore_.assign(frames, -1.0);
   overrideFlags_.assign(frames, false);
   overrideParams_.assign(4 * frames, 0.0);
   std::vector<bool> covered(frames, false);
@@ -47,13 +48,8 @@ void CPWarper::computeModelScores(const std::vector<factorization_window>& windo
     const std::size_t end = std::min<std::size_t>(window.end, frames);
     for (std::size_t f = window.first; f < end; ++f) covered[f] = true;
   }
-
-  std::vector<double> weights(frames, 0.0);
-  for (std::size_t f = 0; f < frames; ++f) {
-    for (const Displacement& d : (*frameDisplacements_)[f]) weights[f] += d.weight;
-    modelScore_[f] = weights[f] >= kLeastWeightSum ? std::min(methodLevel, kMostComplexScore) : 0.0;
-  }
-
+  // Motions that frames' targets must agree with. Where records overlap it is each of theirs.
+  std::multimap<std::size_t, matrix3> stored;
   for (const transition_record& record : transitionWindows) {
     const std::size_t end = std::min<std::size_t>(record.end, frames);
     for (std::size_t f = record.first; f < end; ++f) {
@@ -61,26 +57,59 @@ void CPWarper::computeModelScores(const std::vector<factorization_window>& windo
       for (std::size_t k = 0; k < 4 && from + k < record.motion.size(); ++k) {
         overrideParams_[4 * f + k] = record.motion[from + k];
       }
-      if (covered[f]) continue;
-      if (methodLevel >= kSimilarityScore) modelScore_[f] = kSimilarityScore;
-      overrideFlags_[f] = true;
-    }
-    for (std::size_t f = record.first; f < end; ++f) {
-      if (overrideFlags_[f]) checkConsistency(f);
+      if (!covered[f]) overrideFlags_[f] = true;
+      if (overrideFlags_[f]) stored.emplace(f, storedSimilarity(f));
     }
   }
+  progress();
 
+  std::vector<double> weights(frames, 0.0), medians(frames);
+  std::vector<double> errors(frames, -std::numeric_limits<double>::infinity());  // exempt
+  homography_fitter homography;
+  robust_walk walk(*tracks_, kOutlierRampFrames, 0,
+                   [&](std::size_t f, const std::vector<Displacement>& list) {
+                     for (const Displacement& d : list) weights[f] += d.weight;
+                     const auto [first, last] = stored.equal_range(f);
+                     for (auto at = first; at != last; ++at) {
+                       checkConsistency(f, list, at->second);
+                     }
+                   });
   for (std::size_t f = 0; f < frames; ++f) {
+    progress();
+    const auto [list, median] = walk.next();
+    medians[f] = median;
+    if (list.size() <= kMostEntriesExemptFromSanity) continue;
+    errors[f] = entry_distance(fitSimilarity(list), homography.fit(list));
+  }
+
+  modelScore_.assign(frames, -1.0);
+  for (std::size_t f = 0; f < frames; ++f) {
+    modelScore_[f] = weights[f] >= kLeastWeightSum ? std::min(methodLevel, kMostComplexScore) : 0.0;
+    if (overrideFlags_[f] && methodLevel >= kSimilarityScore) modelScore_[f] = kSimilarityScore;
     tessel::debug::Log("frame %d weight %f score %f\n", static_cast<int>(f), weights[f],
                        modelScore_[f]);
     if (!(modelScore_[f] >= 1.0)) modelScore_[f] = 1.0;
   }
   ramp_scores(modelScore_, kModelRampFrames);
+  for (std::size_t f = 0; f < frames; ++f) {
+    if (modelScore_[f] <= kSimilarityScore) continue;
+    if (medians[f] / frameWidth_ > kLargestDeviation) {
+      tessel::debug::Log("Limiting frame %d to similarity, too high median deviation\n",
+                         static_cast<int>(f));
+    } else if (!(errors[f] < homographyLimit_)) {
+      tessel::debug::Log("Limiting frame %d to similarity because of error %f\n",
+                         static_cast<int>(f), errors[f]);
+    } else {
+      continue;
+    }
+    modelScore_[f] = kSimilarityScore;
+  }
+  ramp_scores(modelScore_, kModelRampFrames);
 }
 
-void CPWarper::checkConsistency(std::size_t frame) const {
-  const matrix3 stored = storedSimilarity(frame);
-  for (const Displacement& d : (*frameDisplacements_)[frame]) {
+void CPWarper::checkConsistency(std::size_t frame, const std::vector<Displacement>& list,
+                                const matrix3& stored) {
+  for (const Displacement& d : list) {
     const double dx = d.targetX - (stored[0] * d.sourceX + stored[1] * d.sourceY + stored[2]);
     const double dy = d.targetY - (stored[3] * d.sourceX + stored[4] * d.sourceY + stored[5]);
     if (std::fabs(dx) <= kConsistency && std::fabs(dy) <= kConsistency) continue;
@@ -94,35 +123,6 @@ void CPWarper::checkConsistency(std::size_t frame) const {
 matrix3 CPWarper::storedSimilarity(std::size_t frame) const {
   const double* p = &overrideParams_[4 * frame];
   return similarity_matrix(p[0], p[1], p[2], p[3]);
-}
-
-void CPWarper::limitByDeviation(const progress_functor& progress) {
-  for (std::size_t f = 0; f < frameDisplacements_->size(); ++f) {
-    progress();
-    const double median = medianDeviation((*frameDisplacements_)[f]);
-    if (median / frameWidth_ > kLargestDeviation && modelScore_[f] > kSimilarityScore) {
-      modelScore_[f] = kSimilarityScore;
-      tessel::debug::Log("Limiting frame %d to similarity, too high median deviation\n",
-                         static_cast<int>(f));
-    }
-  }
-  fade_about_outliers(*frameDisplacements_, 0, frameCount_, kOutlierRampFrames, progress);
-}
-
-void CPWarper::limitByHomographySanity(const progress_functor& progress) {
-  homography_fitter homography;
-  for (std::size_t f = 0; f < frameDisplacements_->size(); ++f) {
-    const std::vector<Displacement>& list = (*frameDisplacements_)[f];
-    if (list.size() <= kMostEntriesExemptFromSanity) continue;
-    progress();
-    const double error = entry_distance(fitSimilarity(list), homography.fit(list));
-    if (!(error < homographyLimit_) && modelScore_[f] > kSimilarityScore) {
-      modelScore_[f] = kSimilarityScore;
-      tessel::debug::Log("Limiting frame %d to similarity because of error %f\n",
-                         static_cast<int>(f), error);
-    }
-  }
-  ramp_scores(modelScore_, kModelRampFrames);
 }
 
 }  // namespace marrow::stabilization

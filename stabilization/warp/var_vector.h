@@ -47,6 +47,19 @@ quantised_warp quantise(const VarVector& record);
 // rebuilding it again gives the same bits. offsets must hold 2 * cols * rows entries.
 VarVector rebuild(const quantised_warp& quantised, std::int32_t cols, std::int32_t rows);
 
+// The same in some 2 KB in place of 37: the offsets of neighbouring vertices differ little.
+struct packed_warp {
+  std::array<point2, 4> corners = {};
+  std::vector<std::uint8_t> offsets;  // see pack
+};
+
+// offsets of `quantised`: cols * rows pairs. What is packed are the x of all vertices, then their
+// y, row-major, each less what a plane through its neighbours left, above and above left has there
+// (0 outside of the grid), modulo 2^32, by memory::PackWords.
+packed_warp pack(const quantised_warp& quantised, std::int32_t cols, std::int32_t rows);
+// Throws std::invalid_argument where the bytes are none that pack makes.
+quantised_warp unpack(const packed_warp& packed, std::int32_t cols, std::int32_t rows);
+
 // A box in output coordinates.
 struct frame_bounds {
   double min_x;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <boost/shared_ptr.hpp>
 #include <cstddef>
 #include <cstdint>
 
@@ -12,7 +13,7 @@ class ClipWarps {
  public:
   virtual ~ClipWarps() = default;
   virtual std::size_t frameCount() const = 0;
-  virtual const stabilization::VarVector& frameWarp(std::size_t frame) const = 0;
+  virtual boost::shared_ptr<const stabilization::VarVector> frameWarp(std::size_t frame) const = 0;
   // The rest grid of source frame M as it lies in the output of frame N, into `warp`; false where
   // no motion between the two is known.
   virtual bool warpedGridOfFrame(std::size_t M, std::size_t N,

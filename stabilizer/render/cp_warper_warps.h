@@ -13,8 +13,8 @@ class CPWarperWarps final : public ClipWarps {
   explicit CPWarperWarps(boost::shared_ptr<const stabilization::CPWarper> warper)
       : warper_(warper) {}
   std::size_t frameCount() const override { return warper_->frameWarpCount(); }
-  const stabilization::VarVector& frameWarp(std::size_t frame) const override {
-    return *warper_->frameWarp(frame);
+  boost::shared_ptr<const stabilization::VarVector> frameWarp(std::size_t frame) const override {
+    return warper_->frameWarp(frame);
   }
   bool warpedGridOfFrame(std::size_t M, std::size_t N,
                          stabilization::VarVector& warp) const override {

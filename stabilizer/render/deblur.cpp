@@ -33,9 +33,9 @@ std::int64_t alignedOffset(const DeblurSettings& settings) {
 double speed(const ClipWarps& warps, std::int64_t frame) {
   const auto last = static_cast<std::int64_t>(warps.frameCount()) - 1;
   const auto centre = [&](std::int64_t f) {
-    const VarVector& warp =
+    const auto warp =
         warps.frameWarp(static_cast<std::size_t>(std::clamp<std::int64_t>(f, 0, last)));
-    return warp.vertex(warp.cols / 2, warp.rows / 2);
+    return warp->vertex(warp->cols / 2, warp->rows / 2);
   };
   const point2 before = centre(frame - 1), after = centre(frame + 1);
   return std::hypot(after.x - before.x, after.y - before.y);

@@ -13,9 +13,11 @@ template <class Pixel>
 std::optional<FrameMesh> meshOfFrame(const FramePass<Pixel>& pass, std::size_t M, int width,
                                      int height) {
   VarVector aligned;
+  boost::shared_ptr<const VarVector> own;
   const VarVector* warp = &aligned;
   if (M == pass.frame) {
-    warp = &pass.warps.frameWarp(M);
+    own = pass.warps.frameWarp(M);
+    warp = own.get();
   } else if (!pass.warps.warpedGridOfFrame(M, pass.frame, aligned)) {
     return std::nullopt;
   }

@@ -49,7 +49,8 @@ crop_rect wholePlane(const Renderer& renderer) {
 std::vector<float> outlinePolygon(const ClipWarps& warps, std::size_t frame,
                                   const Renderer& renderer, const RenderSettings& settings,
                                   double setupOriginX, double setupOriginY) {
-  const VarVector& warp = warps.frameWarp(frame);
+  const auto kept = warps.frameWarp(frame);
+  const VarVector& warp = *kept;
   const crop_rect plane = wholePlane(renderer);
   const double move_x = renderer.planeWidth / 2.0 -
                         ((plane.left + plane.right) / 2.0 + renderer.boundsMinX) - setupOriginX;

@@ -66,7 +66,7 @@ TEST_F(TourFaults, AFailingOperationIsSurvivedWhicheverItIs) {
       if (HasFailure()) return;
     }
   }
-  EXPECT_EQ(suites, 15);
+  EXPECT_EQ(suites, 16);
 }
 
 }  // namespace

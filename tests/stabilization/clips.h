@@ -224,6 +224,19 @@ inline double median_bend(const solved_clip& clip, const std::vector<track_sampl
   return *middle;
 }
 
+// The lists of all frames.
+inline displacement_lists blended_displacements(const stabilizer_global& global,
+                                                const std::vector<factorization_window>& windows,
+                                                const SolverParamsRecord& parameters) {
+  const blended_tracks tracks(global, windows, parameters);
+  displacement_stream stream(tracks);
+  displacement_lists lists;
+  for (std::size_t f = 0; f < global.frame_count; ++f) {
+    lists.push_back(stream.next(f > 0 ? &lists.back() : nullptr));
+  }
+  return lists;
+}
+
 // The positions that the warp of each frame goes by: windows blended where they overlap.
 inline std::vector<track_sample> blended_output(const solved_clip& clip) {
   std::vector<track_sample> rows(clip.global.output.size(), {0, 0, -1, 0});
@@ -288,7 +301,7 @@ inline boost::shared_ptr<CPWarper> driven(const boost::shared_ptr<stabilizer_glo
 
 // Largest distance, in pixels, of a frame's vertices from the rest grid under m.
 inline double distance_from(const CPWarper& warper, int frame, const matrix3& m) {
-  const VarVector& grid = *warper.frameWarp(frame);
+  const VarVector grid = *warper.frameWarp(frame);
   double largest = 0;
   for (int r = 0; r < grid.rows; ++r) {
     for (int c = 0; c < grid.cols; ++c) {

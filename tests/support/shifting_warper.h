@@ -26,7 +26,7 @@ inline boost::shared_ptr<const marrow::stabilization::CPWarper> ShiftingWarper(
       record->values[i] = (vertex % record->cols) * warper->cellWidth() + shift.x;
       record->values[i + 1] = (vertex / record->cols) * warper->cellHeight() + shift.y;
     }
-    warper->storeFrameWarp(record, false);
+    warper->storeFrameWarp(*record);
   }
   marrow::stabilization::MtoNMap::entries_t entries;
   const auto count = static_cast<std::int32_t>(shifts.size());

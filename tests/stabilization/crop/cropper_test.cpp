@@ -38,7 +38,7 @@ grids three_shifts() {
 boost::shared_ptr<cropper> crop(const grids& warps, const SolverParamsRecord& parameters) {
   CPWarper warper(static_cast<int>(warps.size()), 1920, 1080);
   for (const VarVector& warp : warps) {
-    warper.storeFrameWarp(boost::make_shared<VarVector>(warp), false);
+    warper.storeFrameWarp(warp);
   }
   return RunCropper(parameters, warps.size(), warper, kNoProgress);
 }

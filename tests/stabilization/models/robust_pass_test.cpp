@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <random>
 
 #include "tests/stabilization/clips.h"
 
@@ -75,6 +76,64 @@ TEST(FadeAboutOutliersTest, WeightReturnsInsideTheRangeAndTheTrack) {
       EXPECT_NEAR(lists[frame][0].weight, weight, 1e-15) << frame;
     }
   }
+}
+
+// Tracks that begin and end along a clip of 400 frames; a fifth of the samples of some frames stand
+// where no motion takes them.
+stabilizer_global ClipWithOutliers() {
+  std::mt19937 random(3);
+  std::uniform_real_distribution<float> place(0, 600), off(2, 30);
+  stabilizer_global global;
+  global.frame_count = 400;
+  global.feature_count = 40;
+  global.input.assign(400 * 40, {0, 0, -1, 0});
+  for (std::size_t s = 0; s < 40; ++s) {
+    const std::size_t life = 30 + 9 * s;
+    const float x = place(random), y = place(random);
+    for (std::size_t f = 0; f < 400; ++f) {
+      const auto at = static_cast<float>(f);
+      global.input[f * 40 + s] = {x + at, y - at, f % life == 0 ? static_cast<int>(f) + 1 : 0, 0};
+    }
+  }
+  global.output = global.input;
+  for (std::size_t f = 0; f < 400; ++f) {
+    for (std::size_t s = 0; s < 40; ++s) {
+      track_sample& sample = global.output_at(f, s);
+      if (f % 7 == 3 && random() % 5 == 0) sample.x += off(random);
+      if (random() % 300 == 0) sample.status = -1;
+    }
+  }
+  global.trajectories = tracking::BuildTrajectories(global.input.data(), 40, 400);
+  return global;
+}
+
+TEST(RobustWalkTest, SameAsBothStepsOverAllListsFromAnyFrameOn) {
+  const stabilizer_global global = ClipWithOutliers();
+  displacement_lists lists = blended_displacements(global, {}, {});
+  std::vector<double> medians;
+  for (auto& list : lists) medians.push_back(medianDeviation(list));
+  fade_about_outliers(lists, 0, 400, 60);
+
+  const blended_tracks tracks(global, {}, {});
+  std::size_t outliers = 0, faded = 0;
+  for (const std::size_t first : {0, 1, 119, 120, 250, 399}) {
+    std::size_t looked = 0;
+    robust_walk walk(tracks, 60, first, [&](std::size_t, const auto&) { ++looked; });
+    for (std::size_t f = first; f < 400; ++f) {
+      const auto [list, median] = walk.next();
+      EXPECT_EQ(median, medians[f]);
+      ASSERT_EQ(list.size(), lists[f].size());
+      for (std::size_t i = 0; i < list.size(); ++i) {
+        ASSERT_EQ(list[i].weight, lists[f][i].weight) << f << " from " << first;
+        ASSERT_EQ(list[i].targetX, lists[f][i].targetX);
+        outliers += list[i].outlier;
+        faded += !list[i].outlier && list[i].weight < 0.2;
+      }
+    }
+    EXPECT_EQ(looked, std::min<std::size_t>(400, 520 - first));
+  }
+  EXPECT_GT(outliers, 500u);
+  EXPECT_GT(faded, 1000u);
 }
 
 }  // namespace

@@ -45,9 +45,9 @@ TEST(FrameMapTest, APairForEveryNeighbourWithinTheRadiusOnceDriven) {
 TEST(FrameMapTest, SixSharedTracksMakeAnEntryAndFiveDoNot) {
   for (const int shared : {5, 6}) {
     auto global = panning(shared + 16, 6);
-    for (int s = shared; s < shared + 16; ++s) {  // alive in frames 3 to 5, or 0 to 2 alone
+    for (int s = shared; s < shared + 16; ++s) {  // alive in frames 0 to 2, or 3 to 5 alone
       Trajectory& track = global->trajectories[s];
-      (s < shared + 8 ? track.first : track.last) = 3;
+      (s < shared + 8 ? track.last : track.first) = 3;
     }
     const auto warper = driven(global, 2);
     const struct {

@@ -43,5 +43,27 @@ TEST(QuantiseTest, HopelessRecordsDoNotTrap) {
   EXPECT_EQ(stored(nothing).values, nothing.values);
 }
 
+TEST(PackedWarpTest, ComesBackAsItWasAndIsSmall) {
+  quantised_warp q;
+  q.corners[2] = {0.1, -1e300};
+  const std::int32_t cols = 7, rows = 5;
+  for (std::int32_t i = 0; i < cols * rows; ++i) {
+    q.offsets.push_back(i % cols * 1000 + i / cols);  // a plane
+    q.offsets.push_back(i % 2 ? std::numeric_limits<std::int32_t>::max()
+                              : std::numeric_limits<std::int32_t>::min());
+  }
+  const quantised_warp back = unpack(pack(q, cols, rows), cols, rows);
+  EXPECT_EQ(back.offsets, q.offsets);
+  EXPECT_EQ(back.corners[2].y, -1e300);
+  // Of planes nothing is left but their first row and column: 3 groups of 16 and less.
+  for (std::size_t i = 1; i < q.offsets.size(); i += 2) q.offsets[i] = 5;
+  packed_warp packed = pack(q, cols, rows);
+  EXPECT_LT(packed.offsets.size(), 70u);
+  packed.offsets.pop_back();
+  EXPECT_THROW(unpack(packed, cols, rows), std::invalid_argument);
+  packed.offsets.resize(packed.offsets.size() + 2);
+  EXPECT_THROW(unpack(packed, cols, rows), std::invalid_argument);
+}
+
 }  // namespace
 }  // namespace marrow::stabilization

@@ -164,7 +164,7 @@ void ExpectAsPlain(const Scene& s) {
   PaddedWorld<Pixel> out(width, height);
   ASSERT_TRUE(renderFrame(clip, &crop, s.settings, R, 0, pictures, operations, out.pixels));
 
-  const PlainRender<Pixel> plain(R, clip.frameWarp(0), s.settings, crop.rects[0],
+  const PlainRender<Pixel> plain(R, *clip.frameWarp(0), s.settings, crop.rects[0],
                                  getZoom(clip, &crop, s.settings, R), *pictures.worlds[0], width,
                                  height);
   double worst = 0;

@@ -78,7 +78,9 @@ class SolvedClip final : public ClipWarps {
   }
 
   std::size_t frameCount() const override { return warps_.size(); }
-  const VarVector& frameWarp(std::size_t frame) const override { return warps_.at(frame); }
+  boost::shared_ptr<const VarVector> frameWarp(std::size_t frame) const override {
+    return boost::make_shared<const VarVector>(warps_.at(frame));
+  }
   bool warpedGridOfFrame(std::size_t M, std::size_t N, VarVector& warp) const override {
     EXPECT_NE(M, N);
     if (without_motion.count(M)) return false;

@@ -35,7 +35,7 @@ std::int32_t Side(std::uint64_t pixels) {
 void WriteWarps(OutputByteStream& out, const CPWarper& warper) {
   out << warper.gridCols() << warper.gridRows();
   for (std::size_t f = 0; f < warper.frameWarpCount(); ++f) {
-    const quantised_warp warp = quantise(*warper.frameWarp(f));
+    const quantised_warp warp = warper.storedWarp(f);
     out.Write(warp.corners.data(), sizeof warp.corners);
     out.Write(warp.offsets.data(), warp.offsets.size() * sizeof warp.offsets[0]);
   }
@@ -58,9 +58,7 @@ void ReadWarps(InputByteStream& in, CPWarper& warper) {
     in.Read(warp.corners.data(), sizeof warp.corners);
     in.Read(warp.offsets.data(), offset_bytes);
     // Exactly what was stored: rounding it again would move what lies far outside.
-    warper.storeFrameWarp(
-        boost::make_shared<marrow::stabilization::VarVector>(rebuild(warp, cols, rows)),
-        /*quantise=*/false);
+    warper.storeFrameWarp(warp);
   }
 }
 
