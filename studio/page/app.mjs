@@ -100,7 +100,7 @@ function Summary({clip}) {
           <div><dt>${T.facts[2]}</dt><dd>${outcome.most_zoom.toFixed(2)}×</dd></div>
           <div><dt>${T.facts[3]}</dt><dd>${(outcome.most_black * 100).toFixed(1)} %</dd></div>
         </dl>`}
-      ${choice && clip.state !== 'failed' && html`
+      ${choice && !clip.settings.window.as_set && clip.state !== 'failed' && html`
         <p class="hint"><b>${T.chosen}:</b> ${choice.text}${choice.why ? `; ${choice.why}` : ''}.</p>
         ${choice.candidates.length > 1 && html`
           <details class="ways"><summary>${T.otherWays}</summary><ul>
@@ -133,7 +133,11 @@ function App() {
   const transport = useRef({frame: 0, speed: 0, range: null, loop: true, seek: 0}).current;
   const clip = studio.clips[selected] && studio.order.includes(selected) ? studio.clips[selected] : null;
 
+  // Selected, and not heard of yet.
+  const awaited = useRef('');
+  if (clip) awaited.current = '';
   const select = useCallback((id) => {
+    awaited.current = id;
     setSelected(id);
     history.replaceState(null, '', `#${id}`);
     Object.assign(transport, {frame: 0, speed: 0, range: null});
@@ -141,7 +145,7 @@ function App() {
     ask({op: 'open', clip: id});
   }, []);
   useEffect(() => {
-    if (studio.loaded && !clip && studio.order.length) select(studio.order[0]);
+    if (studio.loaded && !clip && !awaited.current && studio.order.length) select(studio.order[0]);
   }, [studio.loaded, studio.order, clip]);
   // A page that was reloaded, or a studio that was started again.
   useEffect(() => { if (clip?.state === 'closed') ask({op: 'open', clip: clip.id}); }, [clip?.id, clip?.state]);

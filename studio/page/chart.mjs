@@ -64,8 +64,8 @@ export function Chart({clip, frame, seek, theme}) {
       scales: {x: {time: false}},
       axes: [{...axis, size: 28, values: (_, list) => list.map((s) => `${+s.toFixed(2)} s`)}, {...axis, size: 48}],
       series: two
-        ? [{}, {stroke: colour('--before'), width: 1.25, label: T.seriesBefore}, {stroke: colour('--accent'), width: 2, label: T.seriesAfter}]
-        : [{}, {stroke: colour('--accent'), width: 2, label: kind === 'window' ? T.seriesZoom : T.seriesBlack, ...(kind === 'black' ? {fill: colour('--accent-soft')} : {})}],
+        ? [{}, {stroke: colour('--before'), width: 1.25, points: {show: false}, label: T.seriesBefore}, {stroke: colour('--accent'), width: 2, points: {show: false}, label: T.seriesAfter}]
+        : [{}, {stroke: colour('--accent'), width: 2, points: {show: false}, label: kind === 'window' ? T.seriesZoom : T.seriesBlack, ...(kind === 'black' ? {fill: colour('--accent-soft')} : {})}],
       hooks: {
         draw: [(plot) => {
           const {clip: of, frame: at} = live.current;

@@ -25,7 +25,7 @@ export const T = {
   windowKinds: {auto: 'By the controls', follow: 'Follows the picture', steady: 'Stands still'},
   zoomAtMost: 'Zoom at most',
   facts: ['Shake', 'Width kept', 'Zoom', 'Black'],
-  zoomSpeed: 'Zoom speed, %/s',
+  zoomSpeed: 'Zoom, %/s',
   still: 'Hold still',
   stills: {auto: 'What serves best', background: 'The background', subject: 'The subject'},
   choose: 'Choose for the clip',

@@ -5,6 +5,9 @@
 #include <system_error>
 #include <utility>
 
+#include "host/stabilize/control_items.h"
+#include "platform/hx/hx_controls.h"
+
 namespace calmframe::studio {
 namespace {
 
@@ -63,8 +66,11 @@ void Clip::Open() {
   workers_ += std::uint64_t{1} << 20;
   std::error_code ignored;
   const bool was_kept = std::filesystem::exists(keep_, ignored);
-  nlohmann::json head = {
-      {"op", "open"}, {"clip", path_}, {"project", was_kept ? keep_ : project_}, {"keep", keep_}};
+  nlohmann::json head = {{"op", "open"},
+                         {"clip", path_},
+                         {"project", was_kept ? keep_ : project_},
+                         {"keep", keep_},
+                         {"version", version_}};
   if (has_settings_) head["settings"] = JsonOf(settings_);
   worker_->Send({std::move(head), {}});
   surroundings_.changed(id_);
@@ -131,6 +137,10 @@ Settings Clip::ByHand() const {
     if (!way.value("taken", false)) continue;
     if (way.value("window", "") == "follow") {
       settings.window.kind = host::WindowSettings::Kind::follow;
+    }
+    // Frames that are only moved, turned and sized: of the methods this is the nearest.
+    if (!way.value("bends", true)) {
+      settings.controls.emplace(HX_METHOD.disk_id, host::kPositionScaleRotation);
     }
     const nlohmann::json changes = way.value("changes", nlohmann::json::object());
     for (const auto& [key, value] : changes.items()) {
@@ -212,8 +222,8 @@ void Clip::Redo() {
 void Clip::Give(Settings settings) {
   settings_ = std::move(settings);
   has_settings_ = true;
-  if (is_analysed()) state_["stale"] = true;
-  Tell({{"op", "set"}, {"settings", JsonOf(settings_)}});
+  ++version_;
+  Tell({{"op", "set"}, {"settings", JsonOf(settings_)}, {"version", version_}});
   surroundings_.changed(id_);
 }
 
@@ -240,6 +250,9 @@ void Clip::Tell(nlohmann::json head) {
 
 nlohmann::json Clip::State() const {
   nlohmann::json state = state_;
+  // What it shows is of other settings still.
+  const auto shows = state.find("shows");
+  state["stale"] = shows != state.end() && shows->is_number() && *shows != version_;
   state["id"] = id_;
   state["path"] = path();
   state["name"] = std::filesystem::path(path()).filename().string();

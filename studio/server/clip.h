@@ -93,6 +93,7 @@ class Clip {
   std::shared_ptr<WorkerProcess> worker_;
   std::map<std::uint64_t, Reply> waiting_;
   std::uint64_t asked_ = 0;
+  std::uint64_t version_ = 1;  // of the settings, as the worker knows them
   std::uint64_t workers_ = 0;  // its numbers grow from worker to worker
 };
 

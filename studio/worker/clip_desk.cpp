@@ -23,14 +23,15 @@ ClipDesk::~ClipDesk() = default;
 void ClipDesk::Open(OpenRequest request) {
   const std::lock_guard lock(mutex_);
   if (request.settings) settings_ = *request.settings;
+  version_ = request.version;
   open_ = std::move(request);
   changed_.notify_all();
 }
 
-void ClipDesk::Set(const Settings& settings) {
+void ClipDesk::Set(const Settings& settings, std::uint64_t version) {
   const std::lock_guard lock(mutex_);
   settings_ = settings;
-  ++version_;
+  version_ = version;
   changed_.notify_all();
 }
 

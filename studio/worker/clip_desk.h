@@ -24,6 +24,7 @@ struct OpenRequest {
   std::string project;               // saved work to take up; empty, or not there: none
   std::string keep;                  // where work is saved by itself; empty: nowhere
   std::optional<Settings> settings;  // none: the saved work's
+  std::uint64_t version = 1;         // of the settings; see ClipDesk::Set
 };
 
 // A clip that a person works on: opens it, works it as it is asked to, and tells how it stands.
@@ -32,7 +33,8 @@ struct OpenRequest {
 // What it tells are objects: parts of the clip's state that are new, each key's value whole.
 // "state": "opening", "open" (not analysed), "working", "ready", "failed"; "error"; "info";
 // "progress"; "panel" and "curves", numbers that grow when Panel() and Curves() change; "picture",
-// which grows when steady frames look different; "stale": they don't show the settings yet;
+// which grows when steady frames look different; "shows": the version of the settings that they
+// show;
 // "outcome", "shots", "choice", "warnings"; "settings", of saved work that was opened with its own.
 class ClipDesk {
  public:
@@ -44,7 +46,8 @@ class ClipDesk {
   ~ClipDesk();
 
   void Open(OpenRequest request);
-  void Set(const Settings& settings);
+  // version: the caller's own number for them, another one for each.
+  void Set(const Settings& settings, std::uint64_t version);
   void Work();
   // Ends what is being worked; it stays as it is until something is changed or asked for.
   void Cancel();
@@ -120,7 +123,8 @@ class ClipDesk {
   std::unique_ptr<host::Film> film_;
   bool whole_ = false;       // all shots were worked
   std::vector<Shot> shots_;  // those that were
-  std::set<std::int32_t> touched_;
+  // Controls that were ever set, and those that are on the open shot.
+  std::set<std::int32_t> touched_, applied_;
   std::vector<std::string> warnings_;
   std::string error_;
   std::string state_ = "opening";

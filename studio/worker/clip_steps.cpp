@@ -170,15 +170,12 @@ void ClipDesk::Fail(const std::string& line) {
 }
 
 void ClipDesk::TellState() {
-  bool stale = false;
-  if (is_solved() && film_->shot()) {
-    const std::lock_guard lock(mutex_);
-    stale = shots_[film_->number()].version != version_;
-  }
+  nlohmann::json shows = nullptr;
+  if (is_solved() && film_->shot()) shows = shots_[film_->number()].version;
   tell_({{"state", state_},
          {"error", error_},
          {"warnings", warnings_},
-         {"stale", stale},
+         {"shows", shows},
          {"progress", nullptr}});
 }
 
@@ -253,8 +250,10 @@ void ClipDesk::OpenClip(const OpenRequest& request) {
                                   static_cast<std::int32_t>(film_->range().end);
   host::SteadyClip& shot = *film_->Next();
   Settings settings;
+  const Settings of_work = SettingsOfWork(shot);
+  for (const auto& control : of_work.controls) touched_.insert(control.first);
   if (!request.settings) {
-    settings = SettingsOfWork(shot);
+    settings = of_work;
     tell_({{"settings", JsonOf(settings)}});
   }
   {
@@ -272,6 +271,7 @@ void ClipDesk::OpenClip(const OpenRequest& request) {
 }
 
 void ClipDesk::OpenAnew(host::Opening opening) {
+  applied_.clear();
   film_.reset();
   if (!IsThere(opened_.project)) {
     film_ = std::make_unique<host::Film>(plugin_, opened_.clip, opening);
@@ -310,20 +310,34 @@ Settings ClipDesk::SettingsOfWork(host::SteadyClip& shot) const {
 }
 
 void ClipDesk::Apply(host::SteadyClip& shot, const Settings& settings) {
-  for (const auto& control : settings.controls) touched_.insert(control.first);
-  host::ParamValues changes;
-  for (const HX_ParamDef& declared : shot.host().declarations()) {
-    if (!IsControl(declared) || touched_.count(declared.disk_id) == 0) continue;
-    const auto wanted = settings.controls.find(declared.disk_id);
-    const double value = wanted == settings.controls.end() ? DefaultOf(declared) : wanted->second;
-    double given = shot.ValueOf(declared.disk_id);
+  const auto given_to = [&shot](std::int32_t disk_id) {
     if (const host::Choice* choice = shot.choice()) {
-      const auto before = choice->given.find(declared.disk_id);
-      if (before != choice->given.end()) given = before->second;
+      const auto given = choice->given.find(disk_id);
+      if (given != choice->given.end()) return given->second;
     }
-    if (given != value) changes[declared.disk_id] = value;
+    return shot.ValueOf(disk_id);
+  };
+  host::ParamValues changes;
+  std::set<std::int32_t> resets;
+  for (const HX_ParamDef& declared : shot.host().declarations()) {
+    const std::int32_t id = declared.disk_id;
+    if (!IsControl(declared)) continue;
+    const auto wanted = settings.controls.find(id);
+    if (wanted != settings.controls.end()) {
+      // What is as it is asked for is left, and a choice with it.
+      if (given_to(id) != wanted->second) changes[id] = wanted->second;
+    } else if (applied_.count(id) > 0 ||
+               (touched_.count(id) > 0 && given_to(id) != DefaultOf(declared))) {
+      resets.insert(id);
+    }
   }
+  if (!resets.empty()) shot.ResetControls(resets);
   shot.SetControls(changes);
+  for (const std::int32_t id : resets) applied_.erase(id);
+  for (const auto& change : changes) {
+    applied_.insert(change.first);
+    touched_.insert(change.first);
+  }
 }
 
 void ClipDesk::Frame(host::SteadyClip& shot, const Settings& settings, Onlooker& onlooker) {
@@ -407,6 +421,7 @@ void ClipDesk::WorkAll() {
       if (shot->range().end >= film_->range().end) break;
       film_->Keep();
       frames_.Hide();
+      applied_.clear();
       if (!film_->Next()) break;
     }
   } catch (const host::BrokenPromise&) {
@@ -431,6 +446,7 @@ void ClipDesk::WorkAll() {
 void ClipDesk::OpenShot(std::size_t number) {
   frames_.Hide();
   film_->Keep();
+  applied_.clear();
   Steady(*film_->Open(number));
 }
 

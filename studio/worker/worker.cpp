@@ -36,10 +36,12 @@ class Worker {
       request.clip = head.value("clip", "");
       request.project = head.value("project", "");
       request.keep = head.value("keep", "");
+      request.version = head.value("version", std::uint64_t{0});
       if (head.contains("settings")) request.settings = SettingsOf(head["settings"]);
       desk_.Open(std::move(request));
     } else if (op == "set") {
-      desk_.Set(SettingsOf(head.value("settings", nlohmann::json::object())));
+      desk_.Set(SettingsOf(head.value("settings", nlohmann::json::object())),
+                head.value("version", std::uint64_t{0}));
     } else if (op == "work") {
       desk_.Work();
     } else if (op == "cancel") {
