@@ -260,7 +260,7 @@ function App() {
             <main class="centre">
               <${Player} key=${clip.id} clip=${clip} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} />
               <${Transport} clip=${clip} frame=${frame} transport=${transport} update=${update} mode=${clip.picture ? mode : 'before'} setMode=${setMode} />
-              <${Chart} clip=${clip} frame=${frame} seek=${(to) => update({seek: to})} theme=${theme} />
+              <${Chart} key=${clip.id} clip=${clip} frame=${frame} seek=${(to) => update({seek: to})} theme=${theme} />
             </main>
             <nav class="switch" role="tablist" aria-label=${T.narrowTabs}>
               ${[['controls', T.controls], ['motion', T.motion], ['clips', T.clips]].map(([one, text]) => html`<button role="tab" aria-selected=${tab === one} onClick=${() => setTab(one)}>${text}</button>`)}

@@ -69,6 +69,7 @@ export function Chart({clip, frame, seek, theme}) {
       hooks: {
         draw: [(plot) => {
           const {clip: of, frame: at} = live.current;
+          if (!of.info) return;
           for (const shot of (of.shots || []).slice(1)) mark(plot, shot.first / of.info.rate, colour('--dim'), [2, 4]);
           const worst = of.outcome?.worst_shake > 0 ? of.outcome.worst_at : undefined;
           if (worst !== undefined) mark(plot, worst, colour('--warn'), [6, 4]);

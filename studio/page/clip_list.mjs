@@ -4,7 +4,7 @@ import {ask, frameAddress} from './link.mjs';
 import {T} from './texts.mjs';
 
 export function facts(outcome) {
-  return [T.shake(outcome.shake_before.toFixed(1), outcome.shake_after.toFixed(1)), T.zoom(outcome.most_zoom.toFixed(2))].join(' · ');
+  return T.shake(outcome.shake_before.toFixed(1), outcome.shake_after.toFixed(1));
 }
 
 function Thumbnail({clip}) {

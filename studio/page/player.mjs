@@ -28,10 +28,13 @@ class Pictures {
     return picture;
   }
 
-  // What is wanted now, the most wanted first; the rest is dropped.
-  want(addresses) {
-    for (const [address, abort] of this.running) {
-      if (!addresses.includes(address)) abort.abort();
+  // What is wanted now, the most wanted first. What runs for something else is dropped, unless that
+  // may still be shown.
+  want(addresses, keeps) {
+    if (!keeps) {
+      for (const [address, abort] of this.running) {
+        if (!addresses.includes(address)) abort.abort();
+      }
     }
     const now = performance.now();
     for (const address of addresses) {
@@ -120,6 +123,8 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
     let ended = false, dirty = true;
     engine.pictures = new Pictures(() => { dirty = true; });
     let shown = null, started = null, lastSpeed = 0, rate = [], drawn = '';
+    // While it plays: every so many frames are fetched, as many as come in time.
+    let stride = 1, late = 0, weighed = 0;
 
     const step = (now) => {
       if (ended) return;
@@ -132,6 +137,7 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
         started = {now, frame: how.frame, seek: how.seek};
         lastSpeed = how.speed;
         rate = [];
+        late = 0;
       }
       if (how.speed) {
         const [first, last] = how.range || [0, frames - 1];
@@ -161,26 +167,46 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
       // In steps, so that a window's size by itself makes no new pictures.
       const width = Math.min(limit, Math.ceil(room / 160) * 160);
       const address = (frame) => frameAddress(of, side, frame, width);
-      const list = [address(how.frame)];
+      const list = [];
+      let onView = address(how.frame);
       if (how.speed) {
-        const sign = Math.sign(how.speed);
-        for (let i = 1; i <= AHEAD; ++i) {
-          const frame = how.frame + sign * i;
+        const sign = Math.sign(how.speed), by = stride * Math.max(1, Math.abs(how.speed));
+        const first = Math.ceil(how.frame / by) * by;
+        for (let i = 0; i < AHEAD; ++i) {
+          const frame = first + sign * i * by;
           if (frame >= 0 && frame < frames) list.push(address(frame));
         }
+        // The nearest that is there, as long as it isn't far behind.
+        for (let back = 0; back <= 2 * of.info.rate; ++back) {
+          const near = address(how.frame - sign * back);
+          if (engine.pictures.held.has(near)) {
+            onView = near;
+            break;
+          }
+        }
+        if (!engine.pictures.held.has(onView)) ++late;
+        if (now - weighed > 500) {
+          if (late > 3 && stride < 8) ++stride;
+          else if (late === 0 && stride > 1 && list.slice(0, 5).every((one) => engine.pictures.held.has(one))) --stride;
+          late = 0;
+          weighed = now;
+        }
+      } else {
+        stride = 1;
+        list.push(onView);
       }
-      if (!of.stale || !shown) engine.pictures.want(list);
-      const picture = engine.pictures.get(list[0]);
-      const key = `${list[0]} ${wanted} ${engine.divider}`;
+      if (!of.stale || !shown) engine.pictures.want(list, how.speed !== 0);
+      const picture = engine.pictures.get(onView);
+      const key = `${onView} ${wanted} ${engine.divider}`;
       if (picture && (key !== drawn || dirty)) {
-        if (list[0] !== shown) {
+        if (onView !== shown) {
           rate.push(now);
           while (rate.length && now - rate[0] > 2000) rate.shift();
         }
-        shown = list[0];
+        shown = onView;
         drawn = key;
         paint(canvas.current, picture, wanted, side === 'both', engine.divider);
-        canvas.current.dataset.shown = list[0];
+        canvas.current.dataset.shown = onView;
         canvas.current.dataset.rate = rate.length > 1
           ? ((rate.length - 1) / (now - rate[0]) * 1000).toFixed(1) : '';
       }

@@ -95,7 +95,6 @@ export const T = {
   forget: 'Remove from the list',
   lost: 'The studio isn’t there. What you set is kept; the page goes on when it is started again.',
   shake: (before, after) => `shake ${before} → ${after}`,
-  zoom: (zoom) => `zoom ${zoom}`,
   kept: (percent) => `${percent} % kept`,
   shot: (number) => `Shot ${number}`,
   worst: 'worst second',
