@@ -85,9 +85,11 @@ std::string JpegEncoder::Encode(const std::vector<PictureView>& pictures, int wi
   if (av_frame_make_writable(&frame) < 0) throw std::bad_alloc();
   for (std::size_t p = 0; p < pictures.size(); ++p) {
     const PictureView picture = OverBlack(pictures[p], state_->flat);
+    // The quick way leaves out pixels of what is made much smaller.
     state_->scaler.reset(NotNull(sws_getCachedContext(
         state_->scaler.release(), picture.width, picture.height, AV_PIX_FMT_ARGB, width, height,
-        AV_PIX_FMT_YUVJ420P, SWS_FAST_BILINEAR, nullptr, nullptr, nullptr)));
+        AV_PIX_FMT_YUVJ420P, picture.width > 2 * width ? SWS_AREA : SWS_FAST_BILINEAR, nullptr,
+        nullptr, nullptr)));
     const std::uint8_t* const from[] = {reinterpret_cast<const std::uint8_t*>(picture.pixels)};
     const int from_rows[] = {static_cast<int>(picture.row_bytes)};
     std::uint8_t* to[3];
