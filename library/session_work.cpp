@@ -134,7 +134,7 @@ host::SteadyClip& ClipSession::FirstShot() {
 bool ClipSession::Steady(host::SteadyClip& shot, host::Watcher& watcher) try {
   shot.Work(watcher);
   const host::CropTrouble trouble = host::ChooseFraming(shot, window_, watcher);
-  const std::string text = TroubleText(trouble);
+  const std::string text = host::TroubleText(trouble);
   if (trouble.kind == host::CropTrouble::Kind::nothing_seen) throw host::SolveFailure(text);
   if (!text.empty()) watcher.Warn(text);
   return true;
@@ -167,7 +167,7 @@ void ClipSession::WorkShot(host::SteadyClip& shot) {
     result.outcome = shot.Measure();
     if (const host::Choice* choice = shot.choice()) result.choice = choice->Json();
   } else {
-    result.outcome = AsFilmed();
+    result.outcome = host::AsFilmed();
   }
   Show(shot, film_->number());
   const std::lock_guard lock(mutex_);

@@ -36,13 +36,6 @@ calmframe_outcome OutcomeOf(const host::Outcome& outcome) {
   return told;
 }
 
-host::Outcome AsFilmed() {
-  host::Outcome outcome;
-  outcome.window = host::Outcome::Window::none;
-  outcome.bends = false;
-  return outcome;
-}
-
 calmframe_shot ShotOf(const ShotResult& result) {
   return {result.first, result.end, result.solved ? 1 : 0, OutcomeOf(result.outcome)};
 }
@@ -55,7 +48,7 @@ host::Outcome OutcomeOf(const std::vector<ShotResult>& shots, double frames_per_
                       static_cast<std::size_t>(shot.end - shot.first)});
   }
   if (solved.size() == 1) return solved[0].outcome;
-  return solved.empty() ? AsFilmed() : host::OutcomeOf(solved);
+  return solved.empty() ? host::AsFilmed() : host::OutcomeOf(solved);
 }
 
 std::string ReportOf(const std::vector<ShotResult>& shots, double frames_per_second,
@@ -109,25 +102,6 @@ std::vector<calmframe_place> PlacesOf(const host::ShownPath& path, std::int64_t 
     place.most_y = window.most.y;
   }
   return places;
-}
-
-std::string TroubleText(const host::CropTrouble& trouble) {
-  using Kind = host::CropTrouble::Kind;
-  const std::string window =
-      std::to_string(trouble.window.width) + "x" + std::to_string(trouble.window.height);
-  switch (trouble.kind) {
-    case Kind::none:
-      return "";
-    case Kind::nothing_seen:
-      return "no part of the picture stays in view; Framing \"Stabilize Only\" or less Smoothness "
-             "may help";
-    case Kind::black:
-      return std::to_string(std::lround(100 * trouble.black)) +
-             " % of the picture stays black: the crop window is " + window +
-             "; more Maximum Scale would fill it, less Smoothness crops less";
-    default:
-      return "only " + window + " pixels stay in view; less Smoothness keeps more";
-  }
 }
 
 }  // namespace calmframe::library

@@ -23,8 +23,6 @@ struct ShotResult {
 };
 
 calmframe_outcome OutcomeOf(const host::Outcome& outcome);
-// What a shot shows that could not be steadied.
-host::Outcome AsFilmed();
 calmframe_shot ShotOf(const ShotResult& result);
 // Of the shots that are solved; of none one that shows the clip as it was filmed.
 host::Outcome OutcomeOf(const std::vector<ShotResult>& shots, double frames_per_second);
@@ -36,8 +34,5 @@ std::string ReportOf(const std::vector<ShotResult>& shots, double frames_per_sec
 std::vector<calmframe_place> PlacesOf(const host::ShownPath& path, std::int64_t frames,
                                       int rows_a_frame);
 std::vector<calmframe_place> PlacesAtRest(std::int64_t frames);
-
-// What a user is told of the effect's own window; empty: nothing.
-std::string TroubleText(const host::CropTrouble& trouble);
 
 }  // namespace calmframe::library

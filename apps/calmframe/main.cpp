@@ -32,6 +32,7 @@
 #include "apps/calmframe/shots_command.h"
 #include "apps/calmframe/split_commands.h"
 #include "apps/calmframe/stabilize_command.h"
+#include "apps/calmframe/studio_command.h"
 #include "host/base/nearest_match.h"
 #include "host/media/clip.h"
 
@@ -162,6 +163,7 @@ int Run(int argc, char** argv) {
   program.footer(kFooter);
   program.require_subcommand(1);
   StabilizeCommand stabilize(program);
+  StudioCommand studio(program);
   BatchCommand batch(program);
   DemoCommand demo(program);
   AnalyzeCommand analyze(program);
@@ -173,6 +175,7 @@ int Run(int argc, char** argv) {
   InfoCommand info(program);
   TracksCommand tracks(program);
   ReportCommand report(program);
+  StudioWorkerCommand studio_worker(program);
   BatchJobCommand batch_job(program);
   BatchPicturesCommand batch_pictures(program);
   BatchShotsCommand batch_shots(program);
@@ -183,9 +186,9 @@ int Run(int argc, char** argv) {
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
   Command* const commands[] = {
-      &stabilize,   &batch,     &demo,   &analyze, &params, &shots,    &render,
-      &info,        &tracks,    &report, &gather,  &join,   &man_page, &batch_pictures,
-      &batch_shots, &batch_job, &bash,   &zsh,     &fish};
+      &stabilize,      &studio,      &batch,     &demo,          &analyze, &params, &shots,
+      &render,         &info,        &tracks,    &report,        &gather,  &join,   &man_page,
+      &batch_pictures, &batch_shots, &batch_job, &studio_worker, &bash,    &zsh,    &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;

@@ -210,8 +210,8 @@ void ReportCommand::Run() {
     host::ShownPath path;
     if (choice) {
       path = clip->Path();
-      figures.before = report::MotionsOf(path.source);
-      figures.after = report::MotionsOf(path.output);
+      figures.before = host::MotionsOf(path.source);
+      figures.after = host::MotionsOf(path.output);
       figures.window.clear();  // the effect's own, which is not shown
       report::AddChoice(*choice, page);
     } else {

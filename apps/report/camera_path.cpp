@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <cmath>
-#include <numbers>
 
 namespace calmframe::report {
 namespace {
@@ -91,31 +90,6 @@ std::optional<FrameMotion> FitMotion(std::span<const Match> matches, Point centr
   }
   return FrameMotion{similarity.x, similarity.y, std::atan2(similarity.b, similarity.a),
                      std::hypot(similarity.a, similarity.b)};
-}
-
-std::vector<std::optional<FrameMotion>> MotionsOf(const host::ShownMotion& shown) {
-  std::vector<std::optional<FrameMotion>> motions;
-  for (std::size_t f = 1; f < shown.motions.size(); ++f) {
-    const host::Similarity forth = host::Inverse(shown.motions[f]);  // from the frame before
-    motions.push_back(FrameMotion{forth.dx / shown.zooms[f], forth.dy / shown.zooms[f],
-                                  std::atan2(forth.b, forth.a), std::hypot(forth.a, forth.b)});
-  }
-  return motions;
-}
-
-std::vector<CameraPlace> PathOf(std::span<const std::optional<FrameMotion>> motions) {
-  std::vector<CameraPlace> path(1);
-  for (const std::optional<FrameMotion>& motion : motions) {
-    CameraPlace place = path.back();
-    if (motion) {
-      place.x -= motion->shift_x;
-      place.y -= motion->shift_y;
-      place.angle -= motion->angle * 180 / std::numbers::pi;
-      place.zoom *= motion->scale;
-    }
-    path.push_back(place);
-  }
-  return path;
 }
 
 double ShakeOf(std::span<const CameraPlace> path) {

@@ -2,13 +2,14 @@
 
 #include <optional>
 #include <span>
-#include <vector>
 
-#include "host/stabilize/measures.h"
+#include "host/stabilize/camera_place.h"
 #include "host/stabilize/similarity.h"
 
 namespace calmframe::report {
 
+using host::CameraPlace;
+using host::FrameMotion;
 using host::Point;  // pixels, y down
 
 // One feature in two frames that follow each other.
@@ -16,32 +17,10 @@ struct Match {
   Point from, to;
 };
 
-// How a picture moves from one frame to the next: p goes to turn * (p - centre) + centre + shift.
-struct FrameMotion {
-  double shift_x = 0, shift_y = 0;  // pixels
-  double angle = 0;                 // radians, clockwise as seen
-  double scale = 1;
-};
-
 // The similarity that most matches agree with: least squares, weighted anew by Tukey's biweight
 // (1974) of the residuals over their median until it stands. Null with fewer than 3 matches and
 // where they lie on one point.
 std::optional<FrameMotion> FitMotion(std::span<const Match> matches, Point centre);
-
-// Of the background, from each frame to the next; in pixels of the source, so that what is enlarged
-// moves as far as what is not.
-std::vector<std::optional<FrameMotion>> MotionsOf(const host::ShownMotion& shown);
-
-// Where the camera points, summed up from the first frame on: the opposite of how the picture
-// moves.
-struct CameraPlace {
-  double x = 0, y = 0;  // pixels, to the right and down
-  double angle = 0;     // degrees clockwise
-  double zoom = 1;      // above 1: closer
-};
-
-// One more than the motions; a motion that is not known counts as none.
-std::vector<CameraPlace> PathOf(std::span<const std::optional<FrameMotion>> motions);
 
 // Standard deviation of the path's second differences, pixels a frame squared: what a viewer sees
 // as shake. 0 for fewer than three places.

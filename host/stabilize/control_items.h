@@ -2,9 +2,10 @@
 
 namespace calmframe::host {
 
-// Items of HX_FRAMING, and of HX_RESULT.
+// Items of HX_FRAMING, of HX_RESULT, and of HX_METHOD.
 inline constexpr double kStabilizeOnly = 1, kCrop = 2, kCropAutoScale = 3, kSynthesizeEdges = 4;
 inline constexpr double kSmoothMotion = 1, kNoMotion = 2;
+inline constexpr double kPositionScaleRotation = 2;
 inline bool Crops(double framing) {
   return framing == kCrop || framing == kCropAutoScale;
 }

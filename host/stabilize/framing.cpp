@@ -48,6 +48,25 @@ CropTrouble CropTroubleOf(SteadyClip& clip) {
   return {.kind = Kind::small, .window = *crop};
 }
 
+std::string TroubleText(const CropTrouble& trouble) {
+  using Kind = CropTrouble::Kind;
+  const std::string window =
+      std::to_string(trouble.window.width) + "x" + std::to_string(trouble.window.height);
+  switch (trouble.kind) {
+    case Kind::none:
+      return "";
+    case Kind::nothing_seen:
+      return "no part of the picture stays in view; Framing \"Stabilize Only\" or less Smoothness "
+             "may help";
+    case Kind::black:
+      return std::to_string(std::lround(100 * trouble.black)) +
+             " % of the picture stays black: the crop window is " + window +
+             "; more Maximum Scale would fill it, less Smoothness crops less";
+    default:
+      return "only " + window + " pixels stay in view; less Smoothness keeps more";
+  }
+}
+
 bool Follows(SteadyClip& clip, const WindowSettings& settings) {
   using Kind = WindowSettings::Kind;
   const auto value = [&clip](const auto& control) { return clip.ValueOf(control.disk_id); };

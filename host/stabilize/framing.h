@@ -2,6 +2,7 @@
 
 #include <optional>
 #include <stdexcept>
+#include <string>
 
 #include "host/stabilize/steady_clip.h"
 
@@ -40,6 +41,8 @@ struct CropTrouble {
                               // than it takes
 };
 CropTrouble CropTroubleOf(SteadyClip& clip);
+// What a user is told of it, who sees the controls by their names; empty: nothing.
+std::string TroubleText(const CropTrouble& trouble);
 
 // After the clip's work: whether windows that follow the picture are what is shown by these
 // settings. Throws WindowRefused, SolveFailure.

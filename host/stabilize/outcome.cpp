@@ -93,6 +93,13 @@ Outcome Outcome::Parse(const nlohmann::json& object) {
   return outcome;
 }
 
+Outcome AsFilmed() {
+  Outcome outcome;
+  outcome.window = Outcome::Window::none;
+  outcome.bends = false;
+  return outcome;
+}
+
 Outcome OutcomeOf(const std::vector<ShotOutcome>& shots) {
   double frames = 0;
   for (const ShotOutcome& shot : shots) frames += static_cast<double>(shot.frames);

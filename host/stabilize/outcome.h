@@ -35,6 +35,9 @@ struct Outcome {
   static Outcome Parse(const nlohmann::json& object);
 };
 
+// Of what could not be steadied: the whole frames as they were filmed.
+Outcome AsFilmed();
+
 // What a shot of a film shows.
 struct ShotOutcome {
   Outcome outcome;

@@ -42,7 +42,7 @@ struct Trial {
   double value;
 };
 constexpr Trial kTrials[] = {
-    {"method position-scale-rotation", HX_METHOD.disk_id, 2},
+    {"method position-scale-rotation", HX_METHOD.disk_id, kPositionScaleRotation},
     {"smoothness 10", HX_SMOOTHNESS.disk_id, 10},
 };
 
@@ -219,6 +219,16 @@ void SteadyClip::SetControls(const ParamValues& values) {
     set_.insert(disk_id);
   }
   has_new_controls_ = has_new_controls_ || !values.empty();
+}
+
+void SteadyClip::ResetControls(const std::set<std::int32_t>& disk_ids) {
+  ParamValues declared_values;
+  for (const HX_ParamDef& declared : host_.declarations()) {
+    const std::optional<double> value = host::ValueOf(declared);
+    if (value && disk_ids.count(declared.disk_id) > 0) declared_values[declared.disk_id] = *value;
+  }
+  SetControls(declared_values);
+  for (const std::int32_t disk_id : disk_ids) set_.erase(disk_id);
 }
 
 void SteadyClip::TakeControls(const ParamValues& values) {

@@ -79,6 +79,8 @@ class SteadyClip {
   // there after the next Work; what was chosen beside the controls before is undone. Throws
   // SolveFailure.
   void SetControls(const ParamValues& values);
+  // The same for what they were declared with; they count as never set.
+  void ResetControls(const std::set<std::int32_t>& disk_ids);
   // The controls of other saved work, before any Work; none of them counts as set.
   void TakeControls(const ParamValues& values);
   // The controls again as they were given, before any choice, and all tracks; what they ask for is

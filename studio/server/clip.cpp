@@ -1,0 +1,274 @@
+#include "studio/server/clip.h"
+
+#include <filesystem>
+#include <stdexcept>
+#include <system_error>
+#include <utility>
+
+#include "host/stabilize/control_items.h"
+#include "platform/hx/hx_controls.h"
+
+namespace calmframe::studio {
+namespace {
+
+constexpr std::size_t kMostSteps = 200;
+
+std::string EndText(int code, const std::string& said) {
+  if (code > 128) {
+    return "the clip brought its worker down (signal " + std::to_string(code - 128) +
+           "); it may be damaged. Your settings are kept; open it to try again";
+  }
+  return "the clip's worker ended" + (said.empty() ? std::string() : ": " + said);
+}
+
+}  // namespace
+
+Clip::Clip(const ClipSurroundings& surroundings, std::string id, std::string path,
+           std::string project, std::string keep)
+    : surroundings_(surroundings),
+      id_(std::move(id)),
+      path_(std::move(path)),
+      project_(std::move(project)),
+      keep_(std::move(keep)),
+      has_settings_(project_.empty()) {
+  state_["state"] = "closed";
+}
+
+Clip::Clip(const ClipSurroundings& surroundings, const nlohmann::json& kept, std::string keep)
+    : Clip(surroundings, kept.at("id").get<std::string>(), kept.value("path", ""),
+           kept.value("project", ""), std::move(keep)) {
+  if (kept.contains("settings")) {
+    settings_ = SettingsOf(kept["settings"]);
+    has_settings_ = true;
+  }
+  state_["outcome"] = kept.value("outcome", nlohmann::json());
+}
+
+Clip::~Clip() {
+  CloseWorker();
+}
+
+void Clip::Open() {
+  if (worker_) return;
+  state_["state"] = "opening";
+  state_["error"] = "";
+  try {
+    worker_ = WorkerProcess::Start(
+        surroundings_.context, surroundings_.ending, surroundings_.worker_words,
+        {[this](Message message) { Take(std::move(message)); },
+         [this](int code, const std::string& said) { End(code, said); }});
+  } catch (const std::system_error& error) {
+    state_["state"] = "failed";
+    state_["error"] = std::string("the clip's worker can't be started: ") + error.what();
+    surroundings_.changed(id_);
+    return;
+  }
+  workers_ += std::uint64_t{1} << 20;
+  std::error_code ignored;
+  const bool was_kept = std::filesystem::exists(keep_, ignored);
+  nlohmann::json head = {{"op", "open"},
+                         {"clip", path_},
+                         {"project", was_kept ? keep_ : project_},
+                         {"keep", keep_},
+                         {"version", version_}};
+  if (has_settings_) head["settings"] = JsonOf(settings_);
+  worker_->Send({std::move(head), {}});
+  surroundings_.changed(id_);
+}
+
+void Clip::CloseWorker() {
+  if (worker_) worker_->Close();
+  worker_.reset();
+  for (auto waiting = std::move(waiting_); auto& [number, reply] : waiting) {
+    reply({{{"error", "the clip was closed"}}, {}});
+  }
+  waiting_.clear();
+}
+
+void Clip::Take(Message message) {
+  if (message.head.contains("tells")) {
+    for (auto& [key, value] : message.head["tells"].items()) {
+      if (key == "settings") {
+        settings_ = SettingsOf(value);
+        has_settings_ = true;
+      } else if (key == "path") {
+        path_ = value.get<std::string>();
+      } else if ((key == "panel" || key == "picture" || key == "curves") && value.is_number()) {
+        state_[key] = workers_ + value.get<std::uint64_t>();
+      } else {
+        state_[key] = std::move(value);
+      }
+    }
+    surroundings_.changed(id_);
+    return;
+  }
+  const auto waiting = waiting_.find(message.head.value("id", std::uint64_t{0}));
+  if (waiting == waiting_.end()) return;
+  const Reply reply = std::move(waiting->second);
+  waiting_.erase(waiting);
+  reply(message);
+}
+
+void Clip::End(int code, const std::string& said) {
+  worker_.reset();
+  state_["state"] = "failed";
+  state_["progress"] = nullptr;
+  state_["error"] = EndText(code, said);
+  for (auto waiting = std::move(waiting_); auto& [number, reply] : waiting) {
+    reply({{{"error", state_["error"]}}, {}});
+  }
+  waiting_.clear();
+  surroundings_.changed(id_);
+}
+
+const nlohmann::json* Clip::ChoiceShown() const {
+  const auto shots = state_.find("shots");
+  if (shots == state_.end() || !shots->is_array() || shots->empty()) return nullptr;
+  const auto choice = shots->front().find("choice");
+  return choice != shots->front().end() && choice->is_object() ? &*choice : nullptr;
+}
+
+Settings Clip::ByHand() const {
+  Settings settings = settings_;
+  const nlohmann::json* const choice = ChoiceShown();
+  if (settings.window.as_set || !choice) return settings;
+  settings.window.as_set = true;
+  for (const nlohmann::json& way : choice->value("candidates", nlohmann::json::array())) {
+    if (!way.value("taken", false)) continue;
+    if (way.value("window", "") == "follow") {
+      settings.window.kind = host::WindowSettings::Kind::follow;
+    }
+    // Frames that are only moved, turned and sized: of the methods this is the nearest.
+    if (!way.value("bends", true)) {
+      settings.controls.emplace(HX_METHOD.disk_id, host::kPositionScaleRotation);
+    }
+    const nlohmann::json changes = way.value("changes", nlohmann::json::object());
+    for (const auto& [key, value] : changes.items()) {
+      settings.controls.emplace(std::stoi(key), value.get<double>());
+    }
+  }
+  return settings;
+}
+
+void Clip::SetControl(std::int32_t id, double value) {
+  Settings settings = ByHand();
+  settings.controls[id] = value;
+  Change(std::move(settings), "control " + std::to_string(id));
+}
+
+void Clip::ResetControl(std::int32_t id) {
+  Settings settings = ByHand();
+  settings.controls.erase(id);
+  Change(std::move(settings), "");
+}
+
+void Clip::SetWindow(const std::string& name, const nlohmann::json& value) {
+  nlohmann::json json = JsonOf(settings_);
+  if (value.is_null()) {
+    json["window"].erase(name);
+  } else {
+    json["window"][name] = value;
+  }
+  Change(SettingsOf(json), "window " + name);
+}
+
+void Clip::TakeWay(std::size_t number) {
+  const nlohmann::json* const choice = ChoiceShown();
+  const nlohmann::json ways =
+      choice ? choice->value("candidates", nlohmann::json::array()) : nlohmann::json::array();
+  if (number >= ways.size()) throw std::invalid_argument("there is no such way");
+  Settings settings = settings_;
+  settings.window.as_set = true;
+  settings.window.kind = host::WindowSettings::Kind::follow;
+  const nlohmann::json changes = ways[number].value("changes", nlohmann::json::object());
+  for (const auto& [key, value] : changes.items()) {
+    settings.controls[std::stoi(key)] = value.get<double>();
+  }
+  Change(std::move(settings), "");
+}
+
+void Clip::Change(Settings settings, const std::string& what) {
+  if (JsonOf(settings) == JsonOf(settings_)) return;
+  constexpr std::chrono::milliseconds kOneStep(900);
+  const auto now = std::chrono::steady_clock::now();
+  if (what.empty() || what != changed_last_ || now - changed_at_ > kOneStep || undo_.empty()) {
+    undo_.push_back(settings_);
+    if (undo_.size() > kMostSteps) undo_.erase(undo_.begin());
+  }
+  redo_.clear();
+  changed_last_ = what;
+  changed_at_ = now;
+  Give(std::move(settings));
+}
+
+void Clip::Undo() {
+  if (undo_.empty()) return;
+  redo_.push_back(settings_);
+  Settings settings = std::move(undo_.back());
+  undo_.pop_back();
+  changed_last_.clear();
+  Give(std::move(settings));
+}
+
+void Clip::Redo() {
+  if (redo_.empty()) return;
+  undo_.push_back(settings_);
+  Settings settings = std::move(redo_.back());
+  redo_.pop_back();
+  changed_last_.clear();
+  Give(std::move(settings));
+}
+
+void Clip::Give(Settings settings) {
+  settings_ = std::move(settings);
+  has_settings_ = true;
+  ++version_;
+  Tell({{"op", "set"}, {"settings", JsonOf(settings_)}, {"version", version_}});
+  surroundings_.changed(id_);
+}
+
+std::uint64_t Clip::Ask(nlohmann::json head, Reply reply) {
+  Open();
+  const std::uint64_t number = ++asked_;
+  if (!worker_) {
+    reply({{{"error", state_["error"]}}, {}});
+    return number;
+  }
+  waiting_[number] = std::move(reply);
+  head["id"] = number;
+  worker_->Send({std::move(head), {}});
+  return number;
+}
+
+void Clip::Forget(std::uint64_t number) {
+  if (waiting_.erase(number) > 0) Tell({{"op", "forget"}, {"of", number}});
+}
+
+void Clip::Tell(nlohmann::json head) {
+  if (worker_) worker_->Send({std::move(head), {}});
+}
+
+nlohmann::json Clip::State() const {
+  nlohmann::json state = state_;
+  // What it shows is of other settings still.
+  const auto shows = state.find("shows");
+  state["stale"] = shows != state.end() && shows->is_number() && *shows != version_;
+  state["id"] = id_;
+  state["path"] = path();
+  state["name"] = std::filesystem::path(path()).filename().string();
+  state["settings"] = JsonOf(settings_);
+  state["can_undo"] = !undo_.empty();
+  state["can_redo"] = !redo_.empty();
+  return state;
+}
+
+nlohmann::json Clip::Kept() const {
+  nlohmann::json kept = {{"id", id_},
+                         {"path", path_},
+                         {"project", project_},
+                         {"outcome", state_.value("outcome", nlohmann::json())}};
+  if (has_settings_) kept["settings"] = JsonOf(settings_);
+  return kept;
+}
+
+}  // namespace calmframe::studio

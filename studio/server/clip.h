@@ -1,0 +1,100 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <nlohmann/json.hpp>
+#include <string>
+#include <vector>
+
+#include "studio/server/worker_process.h"
+#include "studio/wire/settings.h"
+
+namespace calmframe::studio {
+
+// What every clip's worker is started with, and who hears of clips.
+struct ClipSurroundings {
+  boost::asio::io_context& context;
+  EndingThreads& ending;
+  std::vector<std::string> worker_words;  // see WorkerProcess
+  std::function<void(const std::string& id)> changed;
+};
+
+// A clip that a person has open: its settings with their history, which outlast its worker, and
+// what its worker tells.
+class Clip {
+ public:
+  using Reply = std::function<void(const Message& answer)>;
+
+  // keep: where its work is kept. project: saved work that it was opened from; may be empty. The
+  // same of what was kept of a clip before, as Kept gives it.
+  Clip(const ClipSurroundings& surroundings, std::string id, std::string path, std::string project,
+       std::string keep);
+  Clip(const ClipSurroundings& surroundings, const nlohmann::json& kept, std::string keep);
+  ~Clip();
+  Clip(const Clip&) = delete;
+  Clip& operator=(const Clip&) = delete;
+
+  const std::string& id() const { return id_; }
+  // Of the clip, as far as is known; else of the saved work.
+  const std::string& path() const { return path_.empty() ? project_ : path_; }
+  const std::string& keep() const { return keep_; }
+  const Settings& settings() const { return settings_; }
+  bool is_analysed() const { return state_.value("state", "") == "ready"; }
+  bool is_open() const { return worker_ != nullptr; }
+
+  // Starts its worker unless one runs.
+  void Open();
+  void CloseWorker();
+
+  // -- Each a step that can be undone. Quick changes of one thing are one step --
+  void SetControl(std::int32_t id, double value);
+  void ResetControl(std::int32_t id);
+  // A part of the window's settings, by its name; null: as it comes. Throws std::invalid_argument.
+  void SetWindow(const std::string& name, const nlohmann::json& value);
+  // Another one of the ways that were tried. Throws std::invalid_argument where there is none.
+  void TakeWay(std::size_t number);
+  void Undo();
+  void Redo();
+
+  // To the worker, which is opened for it. `head`: see RunWorker. The answer always comes; of a
+  // worker that ends it has an "error". Gives the number by which it may be forgotten.
+  std::uint64_t Ask(nlohmann::json head, Reply reply);
+  void Forget(std::uint64_t number);
+  void Tell(nlohmann::json head);
+
+  // As pages see it.
+  nlohmann::json State() const;
+  // What is left when the studio ends: id, path, project, settings.
+  nlohmann::json Kept() const;
+
+ private:
+  void Take(Message message);
+  void End(int code, const std::string& said);
+  // `what`: changes of one thing in quick succession are one step.
+  void Change(Settings settings, const std::string& what);
+  void Give(Settings settings);
+  // With what was chosen so far as if it had been set by hand; from now on nothing is chosen.
+  Settings ByHand() const;
+  const nlohmann::json* ChoiceShown() const;
+
+  const ClipSurroundings& surroundings_;
+  const std::string id_;
+  std::string path_, project_;
+  const std::string keep_;
+  Settings settings_;
+  bool has_settings_ = true;  // false: those of the project are to be taken
+  std::vector<Settings> undo_, redo_;
+  std::string changed_last_;
+  std::chrono::steady_clock::time_point changed_at_;
+  nlohmann::json state_ = nlohmann::json::object();
+  std::shared_ptr<WorkerProcess> worker_;
+  std::map<std::uint64_t, Reply> waiting_;
+  std::uint64_t asked_ = 0;
+  std::uint64_t version_ = 1;  // of the settings, as the worker knows them
+  std::uint64_t workers_ = 0;  // its numbers grow from worker to worker
+};
+
+}  // namespace calmframe::studio

@@ -1,0 +1,340 @@
+#include "studio/server/studio.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+#include <filesystem>
+#include <stdexcept>
+#include <utility>
+
+#include "studio/server/trust.h"
+
+namespace calmframe::studio {
+namespace {
+
+namespace fs = std::filesystem;
+
+// Workers that are open at once: each holds a clip's tracks and some of its frames.
+constexpr std::size_t kMostOpen = 4;
+constexpr std::size_t kMostClips = 500;
+constexpr char kSession[] = "/session.json";
+
+bool IsProject(const std::string& path) {
+  return fs::path(path).extension() == ".calm";
+}
+
+}  // namespace
+
+Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
+    : context_(context),
+      roots_(settings.roots),
+      folder_(settings.folder),
+      surroundings_{
+          context, ending_, {settings.program}, [this](const std::string& id) { Changed(id); }},
+      flush_(context),
+      keep_(context) {
+  surroundings_.worker_words.insert(surroundings_.worker_words.end(), settings.worker.begin(),
+                                    settings.worker.end());
+  fs::create_directories(folder_);
+  chmod(folder_.c_str(), 0700);  // the secret is in it
+  lock_ = std::make_unique<batch::FileLock>(folder_ + "/lock");
+  if (!lock_->is_held()) {
+    throw std::runtime_error(folder_ +
+                             ": another studio keeps its work there; --session names another one");
+  }
+  renders_ = std::make_unique<RenderQueue>(
+      context, settings.program, folder_,
+      [this](const std::string& id, const std::string& path, const auto& done) {
+        Clip* const clip = Find(id);
+        if (!clip) return done("the clip was removed", {});
+        Open(*clip);
+        clip->Ask({{"op", "save"}, {"path", path}}, [this, id, done](const Message& answer) {
+          Clip* const saved = Find(id);
+          const std::string error = answer.head.value("error", "");
+          done(saved || !error.empty() ? error : "the clip was removed",
+               saved ? saved->settings() : Settings());
+        });
+      },
+      [this] {
+        renders_changed_ = true;
+        Flush();
+      });
+  Restore();
+  if (secret_.empty()) secret_ = NewSecret();
+  Keep();
+}
+
+Studio::~Studio() = default;
+
+void Studio::StopAll() {
+  Keep();
+  renders_.reset();
+  clips_.clear();
+}
+
+void Studio::Restore() {
+  const auto kept = batch::ReadObject(folder_ + kSession);
+  if (!kept) return;
+  try {
+    secret_ = kept->value("secret", "");
+    for (const nlohmann::json clip : kept->value("clips", nlohmann::ordered_json::array())) {
+      const std::string id = clip.at("id").get<std::string>();
+      // Where a clip's roots are closed by now, it is none of this studio's business.
+      try {
+        roots_.Existing(clip.value("path", "").empty() ? clip.value("project", "")
+                                                       : clip.value("path", ""));
+      } catch (const PathRefused&) {
+        continue;
+      }
+      clips_.push_back(std::make_unique<Clip>(surroundings_, clip, KeepPath(id)));
+    }
+  } catch (const std::exception&) {  // damaged: what could be read stands
+  }
+}
+
+Clip* Studio::Find(const std::string& id) const {
+  for (const std::unique_ptr<Clip>& clip : clips_) {
+    if (clip->id() == id) return clip.get();
+  }
+  return nullptr;
+}
+
+Clip& Studio::At(const nlohmann::json& request) const {
+  Clip* const clip = Find(request.value("clip", ""));
+  if (!clip) throw std::invalid_argument("there is no such clip");
+  return *clip;
+}
+
+std::string Studio::Add(const std::string& path) {
+  const std::string place = roots_.Existing(path);
+  for (const std::unique_ptr<Clip>& clip : clips_) {
+    if (clip->path() == place) return clip->id();
+  }
+  if (clips_.size() >= kMostClips) throw std::invalid_argument("too many clips are open");
+  if (fs::is_directory(place)) throw std::invalid_argument(path + ": is a folder");
+  const std::string id = NewSecret().substr(0, 12);
+  const bool is_project = IsProject(place);
+  clips_.push_back(std::make_unique<Clip>(surroundings_, id, is_project ? "" : place,
+                                          is_project ? place : "", KeepPath(id)));
+  order_changed_ = true;
+  Changed(id);
+  return id;
+}
+
+void Studio::Open(Clip& clip) {
+  used_.remove(clip.id());
+  used_.push_front(clip.id());
+  clip.Open();
+  std::size_t open = 0;
+  for (auto id = used_.begin(); id != used_.end();) {
+    Clip* const one = Find(*id);
+    const bool rests = one && one->State().value("state", "") != "working" && !renders_->Needs(*id);
+    if (one && one->is_open() && ++open > kMostOpen && rests) {
+      one->CloseWorker();
+      id = used_.erase(id);
+    } else {
+      ++id;
+    }
+  }
+}
+
+void Studio::Do(const nlohmann::json& request, const Answer& answer) {
+  nlohmann::json said;
+  try {
+    bool answers_later = false;
+    said = Act(request, answer, &answers_later);
+    if (answers_later) return;
+  } catch (const nlohmann::json::exception&) {
+    said = {{"error", "the request is not understood"}};
+  } catch (const std::exception& error) {
+    said = {{"error", error.what()}};
+  }
+  answer(std::move(said));
+}
+
+nlohmann::json Studio::Act(const nlohmann::json& request, const Answer& later,
+                           bool* answers_later) {
+  const std::string op = request.at("op").get<std::string>();
+  if (op == "add") return {{"clip", Add(request.at("path").get<std::string>())}};
+  if (op == "end render") {
+    renders_->Remove(request.at("render").get<std::uint64_t>());
+    return nlohmann::json::object();
+  }
+  Clip& clip = At(request);
+  if (op == "remove") {
+    const std::string keep = clip.keep(), id = clip.id();
+    if (renders_->Needs(id)) throw std::invalid_argument("a render of the clip still waits");
+    std::erase_if(clips_, [&clip](const auto& one) { return one.get() == &clip; });
+    used_.remove(id);
+    std::error_code ignored;
+    fs::remove(keep, ignored);
+    changed_.erase(id);
+    order_changed_ = true;
+    KeepSoon();
+    Flush();
+    return nlohmann::json::object();
+  }
+  return ActOnClip(op, clip, request, later, answers_later);
+}
+
+nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohmann::json& request,
+                                 const Answer& later, bool* answers_later) {
+  if (op == "open") {
+    Open(clip);
+  } else if (op == "control") {
+    clip.SetControl(request.at("control").get<std::int32_t>(), request.at("value").get<double>());
+  } else if (op == "reset") {
+    clip.ResetControl(request.at("control").get<std::int32_t>());
+  } else if (op == "window") {
+    clip.SetWindow(request.at("name").get<std::string>(), request.at("value"));
+  } else if (op == "way") {
+    clip.TakeWay(request.at("way").get<std::size_t>());
+  } else if (op == "undo") {
+    clip.Undo();
+  } else if (op == "redo") {
+    clip.Redo();
+  } else if (op == "analyze") {
+    Open(clip);
+    clip.Tell({{"op", "work"}});
+  } else if (op == "cancel") {
+    clip.Tell({{"op", "cancel"}});
+  } else if (op == "look") {
+    clip.Tell({{"op", "look"}, {"frame", request.at("frame").get<std::int64_t>()}});
+  } else if (op == "save") {
+    const std::string path = roots_.ToWrite(request.at("path").get<std::string>());
+    if (!IsProject(path)) throw std::invalid_argument("saved work is named like walk.calm");
+    if (fs::exists(path) && !request.value("overwrite", false)) {
+      return {{"error", path + ": is there already"}, {"exists", true}};
+    }
+    *answers_later = true;
+    Open(clip);
+    clip.Ask({{"op", "save"}, {"path", path}}, [later](const Message& answer) {
+      nlohmann::json said = nlohmann::json::object();
+      if (const std::string error = answer.head.value("error", ""); !error.empty()) {
+        said["error"] = error;
+      }
+      later(said);
+    });
+  } else if (op == "render") {
+    RenderOrder order;
+    order.clip = clip.id();
+    order.name = fs::path(clip.path()).filename();
+    order.output = roots_.ToWrite(request.at("path").get<std::string>());
+    order.crf = std::clamp(request.value("crf", order.crf), 0, 63);
+    order.codec = request.value("codec", "");
+    order.overwrite = request.value("overwrite", false);
+    order.from = request.value("from", "");
+    order.to = request.value("to", "");
+    for (const std::string* word : {&order.codec, &order.from, &order.to}) {
+      if (word->find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789"
+                                  "_.:") != std::string::npos) {
+        throw std::invalid_argument(*word + ": is no codec or time");
+      }
+    }
+    if (fs::exists(order.output) && !order.overwrite) {
+      return {{"error", order.output + ": is there already"}, {"exists", true}};
+    }
+    renders_->Add(std::move(order));
+  } else {
+    throw std::invalid_argument("there is no such operation");
+  }
+  return nlohmann::json::object();
+}
+
+std::optional<std::uint64_t> Studio::Ask(const std::string& id, nlohmann::json head,
+                                         Clip::Reply reply) {
+  Clip* const clip = Find(id);
+  if (!clip) return {};
+  Open(*clip);
+  return clip->Ask(std::move(head), std::move(reply));
+}
+
+void Studio::Forget(const std::string& id, std::uint64_t number) {
+  if (Clip* const clip = Find(id)) clip->Forget(number);
+}
+
+std::uint64_t Studio::Listen(Listener listener) {
+  nlohmann::json all = {{"clips", nlohmann::json::object()},
+                        {"order", Order()},
+                        {"renders", renders_->State()},
+                        {"roots", roots_.folders()},
+                        {"trouble", trouble_}};
+  for (const std::unique_ptr<Clip>& clip : clips_) all["clips"][clip->id()] = clip->State();
+  listener(std::make_shared<const std::string>(
+      all.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace)));
+  listeners_[++listeners_ever_] = std::move(listener);
+  return listeners_ever_;
+}
+
+nlohmann::json Studio::Order() const {
+  nlohmann::json order = nlohmann::json::array();
+  for (const std::unique_ptr<Clip>& clip : clips_) order.push_back(clip->id());
+  return order;
+}
+
+void Studio::Changed(const std::string& id) {
+  changed_.insert(id);
+  KeepSoon();
+  Flush();
+}
+
+// Many changes at once are one event.
+void Studio::Flush() {
+  if (flushes_) return;
+  flushes_ = true;
+  flush_.expires_after(std::chrono::milliseconds(30));
+  flush_.async_wait([this](const boost::system::error_code& error) {
+    if (error) return;
+    flushes_ = false;
+    nlohmann::json event = nlohmann::json::object();
+    for (const std::string& id : changed_) {
+      if (const Clip* clip = Find(id)) event["clips"][id] = clip->State();
+    }
+    if (order_changed_) event["order"] = Order();
+    if (renders_changed_) event["renders"] = renders_->State();
+    event["trouble"] = trouble_;
+    changed_.clear();
+    order_changed_ = renders_changed_ = false;
+    Send(event);
+  });
+}
+
+void Studio::Send(const nlohmann::json& event) {
+  const auto text = std::make_shared<const std::string>(
+      event.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace));
+  for (const auto listeners = listeners_; const auto& [number, listener] : listeners) {
+    listener(text);
+  }
+}
+
+void Studio::KeepSoon() {
+  if (keeps_) return;
+  keeps_ = true;
+  keep_.expires_after(std::chrono::milliseconds(500));
+  keep_.async_wait([this](const boost::system::error_code& error) {
+    if (error) return;
+    keeps_ = false;
+    const std::string before = trouble_;
+    if (!Keep()) KeepSoon();  // until there is room again
+    if (trouble_ != before) Flush();
+  });
+}
+
+bool Studio::Keep() {
+  nlohmann::json session = {{"secret", secret_}, {"clips", nlohmann::json::array()}};
+  for (const std::unique_ptr<Clip>& clip : clips_) session["clips"].push_back(clip->Kept());
+  const std::string path = folder_ + kSession;
+  if (!batch::WriteWhole(path,
+                         session.dump(1, ' ', false, nlohmann::json::error_handler_t::replace))) {
+    trouble_ = "what you set isn't kept: " + path + ": " + std::strerror(errno);
+    return false;
+  }
+  chmod(path.c_str(), 0600);
+  trouble_.clear();
+  return true;
+}
+
+}  // namespace calmframe::studio

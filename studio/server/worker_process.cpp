@@ -1,0 +1,122 @@
+#include "studio/server/worker_process.h"
+
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <boost/asio/buffer.hpp>
+#include <boost/asio/post.hpp>
+#include <boost/asio/write.hpp>
+#include <cerrno>
+#include <chrono>
+#include <exception>
+#include <system_error>
+#include <utility>
+
+#include "host/batch/child.h"
+
+namespace calmframe::studio {
+
+using boost::system::error_code;
+
+WorkerProcess::WorkerProcess(boost::asio::io_context& context, EndingThreads& ending, Events events)
+    : ending_(ending), socket_(context), events_(std::move(events)), part_(256 << 10) {}
+
+WorkerProcess::~WorkerProcess() {
+  *closed_ = true;
+  error_code ignored;
+  socket_.close(ignored);
+  if (thread_.joinable()) ending_.threads.push_back(std::move(thread_));
+}
+
+std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& context,
+                                                    EndingThreads& ending,
+                                                    std::vector<std::string> words, Events events) {
+  int ends[2];
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
+    throw std::system_error(errno, std::generic_category());
+  }
+  const std::shared_ptr<WorkerProcess> worker(
+      new WorkerProcess(context, ending, std::move(events)));
+  worker->socket_.assign(boost::asio::local::stream_protocol(), ends[0]);
+  words.push_back(std::to_string(ends[1]));
+  // A child belongs to the thread that started it.
+  worker->thread_ = std::thread([words, theirs = ends[1], closed = worker->closed_, &context,
+                                 weak = std::weak_ptr<WorkerProcess>(worker)] {
+    int code = 127;
+    std::string said;
+    try {
+      batch::Child child(words, theirs);
+      close(theirs);
+      using Clock = std::chrono::steady_clock;
+      constexpr std::chrono::seconds kPatience(4);
+      Clock::time_point closed_at = Clock::time_point::max();
+      std::string line;
+      while (true) {
+        const batch::Child::Said what = child.Next(line, 200);
+        if (what == batch::Child::Said::end) break;
+        if (what == batch::Child::Said::line) said = line;
+        if (!*closed) continue;
+        if (closed_at == Clock::time_point::max()) closed_at = Clock::now();
+        if (Clock::now() - closed_at > kPatience) child.AskToEnd();
+      }
+      code = child.Wait();
+    } catch (const std::exception& error) {
+      close(theirs);
+      said = error.what();
+    }
+    boost::asio::post(context, [weak, code, said] {
+      const std::shared_ptr<WorkerProcess> ended = weak.lock();
+      if (!ended || *ended->closed_) return;
+      *ended->closed_ = true;
+      const auto tell = ended->events_.end;
+      ended->events_ = {};
+      if (tell) tell(code, said);
+    });
+  });
+  worker->Read();
+  return worker;
+}
+
+void WorkerProcess::Send(const Message& message) {
+  if (*closed_) return;
+  out_.push_back(Encode(message));
+  if (out_.size() == 1) Write();
+}
+
+void WorkerProcess::Close() {
+  *closed_ = true;
+  events_ = {};
+  error_code ignored;
+  socket_.shutdown(boost::asio::local::stream_protocol::socket::shutdown_both, ignored);
+}
+
+void WorkerProcess::Read() {
+  socket_.async_read_some(boost::asio::buffer(part_), [weak = weak_from_this()](
+                                                          const error_code& error,
+                                                          std::size_t size) {
+    const std::shared_ptr<WorkerProcess> self = weak.lock();
+    if (!self || error || *self->closed_) return;  // its end is told by its process
+    try {
+      self->reader_.Add(self->part_.data(), size);
+      while (std::optional<Message> message = self->reader_.Next()) {
+        if (self->events_.message) self->events_.message(std::move(*message));
+      }
+    } catch (const BadMessage&) {
+      error_code ignored;
+      self->socket_.shutdown(boost::asio::local::stream_protocol::socket::shutdown_both, ignored);
+      return;
+    }
+    self->Read();
+  });
+}
+
+void WorkerProcess::Write() {
+  boost::asio::async_write(socket_, boost::asio::buffer(out_.front()),
+                           [self = shared_from_this()](const error_code& error, std::size_t) {
+                             if (error) return;
+                             self->out_.pop_front();
+                             if (!self->out_.empty()) self->Write();
+                           });
+}
+
+}  // namespace calmframe::studio

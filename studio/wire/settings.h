@@ -1,0 +1,24 @@
+#pragma once
+
+#include <nlohmann/json_fwd.hpp>
+
+#include "host/effects/param_table.h"
+#include "host/stabilize/framing.h"
+
+namespace calmframe::studio {
+
+// What a person has set for a clip: of the effect's controls those that were touched, and what of
+// each frame is shown.
+struct Settings {
+  host::ParamValues controls;
+  host::WindowSettings window;
+};
+
+// {"controls": {"20": 80}, "window": {"kind": "follow", "most_zoom": 1.2, "zoom_speed": 5,
+// "still": "subject", "as_set": true}}; what is as it comes is left out.
+nlohmann::json JsonOf(const Settings& settings);
+// Of such an object, also of one that somebody made up: what isn't known is left out. Throws
+// std::invalid_argument, one line, for a value of another kind or out of range.
+Settings SettingsOf(const nlohmann::json& json);
+
+}  // namespace calmframe::studio
