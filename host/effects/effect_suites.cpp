@@ -260,7 +260,7 @@ HX_Err IsWanted(HX_EffectRef effect, std::uint8_t* wanted) {
 }
 
 HX_Err Keep(HX_EffectRef effect, std::uint32_t number, const void* bytes, std::uint64_t size) {
-  return WithInstance("Analysis Keeping.Keep", effect, [&](Host&, Instance& instance) -> HX_Err {
+  return WithInstance("Analysis Keeping.Keep", effect, [&](Instance& instance) -> HX_Err {
     const auto& keeper = instance.effect()->keeper();
     if (keeper) keeper->Keep(number, static_cast<const std::uint8_t*>(bytes), size);
     return HX_ERR_NONE;
@@ -269,7 +269,7 @@ HX_Err Keep(HX_EffectRef effect, std::uint32_t number, const void* bytes, std::u
 
 HX_Err FindPiece(HX_EffectRef effect, std::uint32_t number, const void** bytes,
                  std::uint64_t* size) {
-  return WithInstance("Analysis Keeping.Find", effect, [&](Host&, Instance& instance) -> HX_Err {
+  return WithInstance("Analysis Keeping.Find", effect, [&](Instance& instance) -> HX_Err {
     const auto& keeper = instance.effect()->keeper();
     const std::vector<std::uint8_t>* piece = keeper ? keeper->Find(number) : nullptr;
     *bytes = piece ? piece->data() : nullptr;
