@@ -14,7 +14,6 @@
 namespace marrow::render {
 
 using stabilization::point2;
-using stabilization::VarVector;
 
 namespace {
 
