@@ -202,19 +202,18 @@ void Clip::Change(Settings settings, const std::string& what) {
 }
 
 void Clip::Undo() {
-  if (undo_.empty()) return;
-  redo_.push_back(settings_);
-  Settings settings = std::move(undo_.back());
-  undo_.pop_back();
-  changed_last_.clear();
-  Give(std::move(settings));
+  Step(undo_, redo_);
 }
 
 void Clip::Redo() {
-  if (redo_.empty()) return;
-  undo_.push_back(settings_);
-  Settings settings = std::move(redo_.back());
-  redo_.pop_back();
+  Step(redo_, undo_);
+}
+
+void Clip::Step(std::vector<Settings>& from, std::vector<Settings>& to) {
+  if (from.empty()) return;
+  to.push_back(settings_);
+  Settings settings = std::move(from.back());
+  from.pop_back();
   changed_last_.clear();
   Give(std::move(settings));
 }

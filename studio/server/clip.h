@@ -75,6 +75,8 @@ class Clip {
   void End(int code, const std::string& said);
   // `what`: changes of one thing in quick succession are one step.
   void Change(Settings settings, const std::string& what);
+  // Takes the last of `from`; what stands goes to `to`.
+  void Step(std::vector<Settings>& from, std::vector<Settings>& to);
   void Give(Settings settings);
   // With what was chosen so far as if it had been set by hand; from now on nothing is chosen.
   Settings ByHand() const;
