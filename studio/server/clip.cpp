@@ -70,6 +70,7 @@ void Clip::Open() {
                          {"clip", path_},
                          {"project", was_kept ? keep_ : project_},
                          {"keep", keep_},
+                         {"roots", surroundings_.roots},
                          {"version", version_}};
   if (has_settings_) head["settings"] = JsonOf(settings_);
   worker_->Send({std::move(head), {}});

@@ -18,6 +18,7 @@ namespace calmframe::studio {
 struct ClipSurroundings {
   boost::asio::io_context& context;
   EndingThreads& ending;
+  std::vector<std::string> roots;         // see Roots
   std::vector<std::string> worker_words;  // see WorkerProcess
   std::function<void(const std::string& id)> changed;
 };

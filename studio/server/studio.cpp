@@ -32,8 +32,11 @@ Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
     : context_(context),
       roots_(settings.roots),
       folder_(settings.folder),
-      surroundings_{
-          context, ending_, {settings.program}, [this](const std::string& id) { Changed(id); }},
+      surroundings_{context,
+                    ending_,
+                    roots_.folders(),
+                    {settings.program},
+                    [this](const std::string& id) { Changed(id); }},
       flush_(context),
       keep_(context) {
   surroundings_.worker_words.insert(surroundings_.worker_words.end(), settings.worker.begin(),

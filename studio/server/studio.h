@@ -16,7 +16,7 @@
 #include "host/batch/files.h"
 #include "studio/server/clip.h"
 #include "studio/server/render_queue.h"
-#include "studio/server/roots.h"
+#include "studio/wire/roots.h"
 
 namespace calmframe::studio {
 

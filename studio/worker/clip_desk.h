@@ -23,6 +23,7 @@ struct OpenRequest {
   std::string clip;                  // empty: the project's
   std::string project;               // saved work to take up; empty, or not there: none
   std::string keep;                  // where work is saved by itself; empty: nowhere
+  std::vector<std::string> roots;    // folders that the clip may lie in, whatever a project says
   std::optional<Settings> settings;  // none: the saved work's
   std::uint64_t version = 1;         // of the settings; see ClipDesk::Set
 };

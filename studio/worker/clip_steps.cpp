@@ -5,11 +5,13 @@
 #include <utility>
 
 #include "host/base/param_text.h"
+#include "host/media/clip_files.h"
 #include "host/stabilize/control_items.h"
 #include "host/stabilize/drawing.h"
 #include "host/stabilize/failures.h"
 #include "host/stabilize/framing.h"
 #include "platform/hx/hx_controls.h"
+#include "studio/wire/roots.h"
 #include "studio/worker/clip_desk.h"
 #include "studio/worker/curves.h"
 #include "studio/worker/panel.h"
@@ -280,6 +282,8 @@ void ClipDesk::OpenAnew(host::Opening opening) {
   const host::Project project = host::LoadProject(opened_.project);
   std::string clip = opened_.clip;
   if (clip.empty()) clip = host::FindClip(opened_.project, project);
+  const std::filesystem::path place = clip;
+  Roots(opened_.roots).Existing(media::IsSequence(clip) ? place.parent_path() : place);
   if (host::ContentOf(clip) != project.clip_content) {
     if (opened_.project != opened_.keep) {
       throw host::ProjectFailure(opened_.project + ": is of another clip, " + project.clip_path);

@@ -36,6 +36,7 @@ class Worker {
       request.clip = head.value("clip", "");
       request.project = head.value("project", "");
       request.keep = head.value("keep", "");
+      request.roots = head.value("roots", std::vector<std::string>());
       request.version = head.value("version", std::uint64_t{0});
       if (head.contains("settings")) request.settings = SettingsOf(head["settings"]);
       desk_.Open(std::move(request));

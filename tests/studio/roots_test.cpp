@@ -1,4 +1,4 @@
-#include "studio/server/roots.h"
+#include "studio/wire/roots.h"
 
 #include <unistd.h>
 
