@@ -15,6 +15,7 @@
 #include "apps/calmframe/film_work.h"
 #include "apps/calmframe/plugin_path.h"
 #include "apps/calmframe/project_work.h"
+#include "apps/calmframe/thumbnails.h"
 #include "apps/report/data_url.h"
 #include "host/batch/clip_names.h"
 #include "host/batch/clip_search.h"
@@ -58,26 +59,32 @@ void CheckParams(const ControlFlags& controls) {
   }
 }
 
-// A frame of a clip, small: not its first, which may be black, and one that is decoded soon.
-std::string PictureOf(const std::string& path) {
-  constexpr int kWidth = 160;  // pixels
-  constexpr std::size_t kSoon = 25;
-  std::size_t shown = 0;
-  const auto reader = media::ClipReader::OpenPromised(path, [&](const media::ClipInfo& clip) {
-    shown = std::min(clip.frame_count / 2, kSoon);
-    return media::FrameRange{shown, shown + 1};
-  });
-  const media::ClipInfo& info = reader->info();
-  shown = std::min(shown, info.frame_count - 1);
-  std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(info.width) *
-                                static_cast<std::size_t>(info.height));
-  const std::ptrdiff_t row_bytes = info.width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8));
-  reader->Read(shown, pixels.data(), row_bytes);
-  return report::DataUrlOf(
-      {pixels.data(), row_bytes, info.width, info.height,
-       static_cast<double>(info.pixel_aspect.num) / static_cast<double>(info.pixel_aspect.den)},
-      kWidth);
-}
+// The frame that stands for a clip, 8 bits deep.
+class ThumbnailSource {
+ public:
+  explicit ThumbnailSource(const std::string& path) {
+    std::size_t shown = 0;
+    const auto reader = media::ClipReader::OpenPromised(path, [&](const media::ClipInfo& clip) {
+      shown = ThumbnailFrame(clip.frame_count);
+      return media::FrameRange{shown, shown + 1};
+    });
+    info_ = reader->info();
+    pixels_.resize(static_cast<std::size_t>(info_.width) * static_cast<std::size_t>(info_.height));
+    reader->Read(std::min(shown, info_.frame_count - 1), pixels_.data(), row_bytes());
+  }
+  report::PictureView view() const {
+    const media::Ratio& aspect = info_.pixel_aspect;
+    return {pixels_.data(), row_bytes(), info_.width, info_.height,
+            static_cast<double>(aspect.num) / static_cast<double>(aspect.den)};
+  }
+
+ private:
+  std::ptrdiff_t row_bytes() const {
+    return info_.width * static_cast<std::ptrdiff_t>(sizeof(HX_Pixel8));
+  }
+  media::ClipInfo info_;
+  std::vector<HX_Pixel8> pixels_;
+};
 
 }  // namespace
 
@@ -316,9 +323,8 @@ BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)
 }
 
 void BatchPicturesCommand::Run() {
-  const nlohmann::ordered_json object = {{"before", PictureOf(before_)},
-                                         {"after", PictureOf(after_)}};
-  std::printf("%s\n", object.dump().c_str());
+  const ThumbnailSource before(before_), after(after_);
+  std::printf("%s\n", Thumbnails(before.view(), after.view()).dump().c_str());
 }
 
 }  // namespace calmframe

@@ -2,12 +2,14 @@
 
 #include <algorithm>
 #include <nlohmann/json.hpp>
+#include <optional>
 #include <sstream>
 
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
+#include "apps/calmframe/thumbnails.h"
 #include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
 
@@ -175,6 +177,8 @@ void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::stri
                 const ControlFlags& controls, const OutputFlags& flags, int threads,
                 media::ClipWriter& writer, SideBySide* both, ProgressLine& progress) {
   FilmOutcome outcome(film);
+  std::optional<std::size_t> thumbnail;
+  if (flags.thumbnails) thumbnail = ThumbnailFrame(part.size());
   WorkFile file(project);
   std::size_t drawn = 0;
   while (host::SteadyClip* const shot = NextShot(film, controls)) {
@@ -189,7 +193,7 @@ void SteadyFilm(host::Film& film, const media::FrameRange& part, const std::stri
     if (frames.size() == 0) continue;
     const std::size_t first = shot->range().first;
     RenderClip(*shot, {frames.first - first, frames.end - first}, SettingsOf(flags, threads), drawn,
-               frames.end == part.end, writer, both, progress);
+               frames.end == part.end, thumbnail, writer, both, progress);
     drawn += frames.size();
     if (steadied) outcome.Add(*shot);
   }

@@ -7,11 +7,13 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <nlohmann/json.hpp>
 #include <thread>
 #include <utility>
 #include <vector>
 
 #include "apps/calmframe/failures.h"
+#include "apps/calmframe/thumbnails.h"
 #include "host/effects/renderer.h"
 #include "host/stabilize/drawing.h"
 #include "host/timeline/layer.h"
@@ -74,7 +76,7 @@ class RenderAhead {
         const std::int64_t frame = next_++;
         lock.unlock();
         // First, since the render asks for the same one.
-        const host::PicturePtr shot = settings_.shots ? Shot(frame) : nullptr;
+        const host::PicturePtr shot = HasShot(frame) ? Shot(frame) : nullptr;
         host::SteadyFrame steady = host::DrawFrame(*renderer, frame, settings_.depth,
                                                    clip_.info().field_order, settings_.downsample);
         DrawnFrame drawn{std::move(steady.pixels), shot, std::move(steady.banner)};
@@ -87,6 +89,10 @@ class RenderAhead {
       if (!failure_) failure_ = std::current_exception();
       changed_.notify_all();
     }
+  }
+
+  bool HasShot(std::int64_t frame) const {
+    return settings_.shots || settings_.shot_of == static_cast<std::size_t>(frame);
   }
 
   host::PicturePtr Shot(std::int64_t frame) const {
@@ -182,10 +188,11 @@ void TellLosses(const media::ClipWriter& writer, const SideBySide* both, Progres
 }
 
 void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
-                std::size_t at, bool last, media::ClipWriter& writer, SideBySide* both,
-                ProgressLine& progress) {
+                std::size_t at, bool last, std::optional<std::size_t> thumbnail,
+                media::ClipWriter& writer, SideBySide* both, ProgressLine& progress) {
   RenderSettings own = settings;
   own.shots = both != nullptr;
+  if (thumbnail && *thumbnail >= at) own.shot_of = *thumbnail - at + range.first;
   const auto finish = [&] {
     writer.Finish();
     if (both) both->Finish();
@@ -196,6 +203,11 @@ void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSe
         const std::size_t to = frame - range.first + at;
         Write(writer, to, *drawn.pixels);
         if (both) both->Write(to, *drawn.shot, *drawn.pixels);
+        if (to == thumbnail) {
+          progress.Item(
+              "", Thumbnails(WorldOf(*drawn.shot), drawn.pixels->world(), clip.info().pixel_aspect),
+              false);
+        }
       },
       last ? std::function<void()>(finish) : nullptr);
   for (const std::string& line : said) progress.Warn(line);

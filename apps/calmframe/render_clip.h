@@ -3,6 +3,7 @@
 #include <cstddef>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -27,13 +28,15 @@ struct DrawnFrame {
 // depth: 8, 16 or 32 (float) bits of a component, 0 what the source and its framing need.
 // downsample: a side is drawn with one pixel in so many. threads: frames in work at once, 0 as many
 // as there are processors. warning_banner: over frames that could not be steadied as asked, the
-// effect's banner; whatever the clip's own control says. shots: with the frames as they were shot.
+// effect's banner; whatever the clip's own control says. shots: with the frames as they were shot;
+// or shot_of: with that one.
 struct RenderSettings {
   int depth = 0;
   int downsample = 1;
   int threads = 0;
   bool warning_banner = false;
   bool shots = false;
+  std::optional<std::size_t> shot_of = {};
 };
 
 // Renders a solved clip's frames, several at a time, and gives them out in order, with their number
@@ -55,9 +58,10 @@ void TellLosses(const media::ClipWriter& writer, const SideBySide* both, Progres
 
 // The same into a file, and into one of before and after, if there is such: the range's first frame
 // becomes the output's frame `at`. With the last ones the files are whole. What banners say, and
-// the writers' warnings, are told.
+// the writers' warnings, are told; and of the output's frame `thumbnail`, if these have it, what it
+// looks like before and after, small.
 void RenderClip(SteadyClip& clip, const media::FrameRange& range, const RenderSettings& settings,
-                std::size_t at, bool last, media::ClipWriter& writer, SideBySide* both,
-                ProgressLine& progress);
+                std::size_t at, bool last, std::optional<std::size_t> thumbnail,
+                media::ClipWriter& writer, SideBySide* both, ProgressLine& progress);
 
 }  // namespace calmframe

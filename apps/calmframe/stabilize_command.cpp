@@ -217,6 +217,8 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
   AddSideBySideFlag(parser_, flags_);
   AddProjectFlag(parser_, project_);
   AddRunFlags(parser_, run_);
+  PutInGroup("", {AddSwitch(parser_, "--thumbnails", flags_.thumbnails,
+                            "Tell what a frame looks like before and after, for batch's page")});
 }
 
 void StabilizeCommand::Run() {

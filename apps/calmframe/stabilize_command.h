@@ -41,6 +41,7 @@ struct OutputFlags {
   bool warning_banner = false;
   std::string side_by_side;  // a file, of before and after; empty: none
   bool labels_sides = false;
+  bool thumbnails = false;  // of one frame, told among what comes out
 };
 void AddOutputFlags(CLI::App& command, OutputFlags& flags);
 // Adds --side-by-side.

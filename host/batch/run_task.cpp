@@ -133,14 +133,13 @@ class Run {
       }
       Save();
     }
-    std::string pictures;
-    try {
-      pictures_ = &pictures;
-      Program({plan_.program, "batch-pictures", task_.source, plan_.OutputOf(task_)});
-    } catch (const Failed&) {  // the page goes without
+    if (pictures_.empty()) {  // of an output that was joined, or is from a run before
+      try {
+        Program({plan_.program, "batch-pictures", task_.source, plan_.OutputOf(task_)});
+      } catch (const Failed&) {  // the page goes without
+      }
     }
-    pictures_ = nullptr;
-    if (!pictures.empty()) WriteWhole(folder_.pictures(), pictures);
+    if (!pictures_.empty()) WriteWhole(folder_.pictures(), pictures_);
   }
 
   void Save() {
@@ -154,8 +153,9 @@ class Run {
   std::vector<std::string> Words() const {
     std::vector<std::string> words = {plan_.program};
     if (task_.words.empty()) {
-      words.insert(words.end(), {"stabilize", task_.source, written_,
-                                 "--project=" + plan_.ProjectOf(task_), "--overwrite"});
+      words.insert(words.end(),
+                   {"stabilize", task_.source, written_, "--project=" + plan_.ProjectOf(task_),
+                    "--overwrite", "--thumbnails"});
       words.insert(words.end(), plan_.settings.begin(), plan_.settings.end());
     } else {
       std::error_code ignored;
@@ -246,8 +246,8 @@ class Run {
       } else if (json.contains("error")) {
         error_ = Own(json.at("error").get<std::string>());
         error_code_ = json.value("exit_code", kWorkCode);
-      } else if (json.contains("before") && pictures_) {
-        *pictures_ = line;
+      } else if (json.contains("before")) {
+        pictures_ = line;
       } else if (json.contains("width_kept")) {
         record.outcome = json;
       }
@@ -304,7 +304,7 @@ class Run {
   const std::string written_;
   std::string error_;
   int error_code_ = 0;
-  std::string* pictures_ = nullptr;
+  std::string pictures_;  // of a frame before and after, as the program told them
   double share_ = 0;
   Clock::time_point told_ = Clock::now() - std::chrono::hours(1);
 };
