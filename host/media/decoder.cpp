@@ -8,6 +8,7 @@
 #include <cstdarg>
 #include <cstring>
 #include <fstream>
+#include <iterator>
 #include <numeric>
 #include <string_view>
 
@@ -80,6 +81,23 @@ const AVCodec* AlphaDecoderFor(const AVStream& stream) {
   }
 }
 
+// All demuxers but those that open what a file names, other files or addresses: a clip is what is
+// in its file. And but the one that shows text as pictures.
+std::string DemuxersForClips() {
+  constexpr std::string_view kOthers[] = {"concat", "dash", "hls", "imf", "rtp",
+                                          "rtsp",   "sap",  "sdp", "tty", "webm_dash_manifest"};
+  std::string names;
+  void* next = nullptr;
+  while (const AVInputFormat* const format = av_demuxer_iterate(&next)) {
+    const std::string_view name = format->name;  // or several, with commas between
+    const std::string_view first = name.substr(0, name.find(','));
+    if (std::find(std::begin(kOthers), std::end(kOthers), first) != std::end(kOthers)) continue;
+    if (!names.empty()) names += ',';
+    names += name;
+  }
+  return names;
+}
+
 }  // namespace
 
 void ListenToFfmpeg() {
@@ -98,7 +116,11 @@ InputPtr OpenInput(const std::string& path) {
 
   AVFormatContext* opened = nullptr;
   AVDictionary* options = nullptr;
-  if (av_dict_set(&options, "protocol_whitelist", "file", 0) < 0) throw std::bad_alloc();
+  static const std::string demuxers = DemuxersForClips();
+  if (av_dict_set(&options, "protocol_whitelist", "file", 0) < 0 ||
+      av_dict_set(&options, "format_whitelist", demuxers.c_str(), 0) < 0) {
+    throw std::bad_alloc();
+  }
   const AVInputFormat* pictures = nullptr;
   if (!files.pattern.empty()) {
     pictures = av_find_input_format("image2");
@@ -113,10 +135,11 @@ InputPtr OpenInput(const std::string& path) {
          "its index is missing, without which no frame is found: the recording or the copy "
          "broke off before its end");
   }
-  if (error < 0) Fail(path, "not a video file, or damaged at its start", error);
+  constexpr char kNoClip[] = "not a video file, or damaged at its start";
+  // Numbers that demuxers give for what they can't read; of the system's own, ruled out above.
+  if (error == AVERROR(EINVAL) || error == AVERROR(EBUSY)) Fail(path, kNoClip);
+  if (error < 0) Fail(path, kNoClip, error);
   InputPtr container(opened);
-  // Text is shown as pictures by this one.
-  if (std::string_view(container->iformat->name) == "tty") Fail(path, "not a video file");
   error = avformat_find_stream_info(container.get(), nullptr);
   if (error < 0) Fail(path, "its streams can't be read", error);
   return container;
