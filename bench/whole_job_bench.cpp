@@ -172,12 +172,17 @@ class Medians {
 
 const std::string kProgram = CALMFRAME_PROGRAM;
 
-// Ours to a peer; `ratio` should not exceed `limit`.
-void Beside(benchmark::State& state, double limit, double (*peer)(const std::string&)) {
-  const std::string clip = ClipOf(state);
+using Words = std::vector<std::string>;
+using Peer = double (*)(const std::string& clip);
+
+// Ours to a peer; `ratio` should not exceed `limit`. `flags` stand behind the clip.
+void Beside(benchmark::State& state, double limit, const std::string& clip, const Words& flags,
+            Peer peer) {
   Medians medians(state);
+  Words ours_is = {kProgram, "stabilize", clip};
+  ours_is.insert(ours_is.end(), flags.begin(), flags.end());
   for (auto _ : state) {
-    const double ours = RunProcess({kProgram, "stabilize", clip, "-"});
+    const double ours = RunProcess(ours_is);
     state.SetIterationTime(ours);
     medians.Add("frames_per_s", static_cast<double>(state.range(2)) / ours);
     medians.Add("ratio", ours / peer(clip));
@@ -185,12 +190,41 @@ void Beside(benchmark::State& state, double limit, double (*peer)(const std::str
   state.counters["limit"] = limit;
 }
 
+// As it comes, which chooses for the clip.
 void BesideVidstab(benchmark::State& state) {
-  Beside(state, 1, Vidstab);
+  Beside(state, 0.7, ClipOf(state), {"-"}, Vidstab);
+}
+
+void AsSetBesideVidstab(benchmark::State& state) {
+  Beside(state, 0.5, ClipOf(state), {"-", "--as-set"}, Vidstab);
+}
+
+// The same clip in another kind of file; `how` are ffmpeg's words that make it.
+void FromBesideVidstab(benchmark::State& state, const std::string& extension, const Words& how) {
+  const std::string clip = Folder() / ("from-" + std::to_string(state.range(1)) + extension);
+  if (!fs::exists(clip)) {
+    Words make = {"ffmpeg", "-i", ClipOf(state)};
+    make.insert(make.end(), how.begin(), how.end());
+    make.push_back(clip);
+    RunProcess(make);
+  }
+  Beside(state, 0.5, clip, {"-", "--as-set"}, Vidstab);
+}
+
+// Two decodes and an encode, the least that a job of two passes can do.
+double DecodeTwiceAndEncode(const std::string& clip) {
+  const std::string out = Folder() / "encoded.mp4";
+  return RunProcess({"ffmpeg", "-i", clip, "-f", "null", "-"}) +
+         RunProcess({"ffmpeg", "-y", "-i", clip, "-c:v", "libx264", "-crf", "18", out});
+}
+
+void EncodedBesideTwoDecodesAndAnEncode(benchmark::State& state) {
+  Beside(state, 2, ClipOf(state), {Folder() / "steady.mp4", "--as-set", "--overwrite"},
+         DecodeTwiceAndEncode);
 }
 
 void BesideOpencvTwoPass(benchmark::State& state) {
-  Beside(state, 1.0 / 3, OpencvTwoPass);
+  Beside(state, 1.0 / 3, ClipOf(state), {"-"}, OpencvTwoPass);
 }
 
 void PeakMemory(benchmark::State& state) {
@@ -269,6 +303,22 @@ void Once(benchmark::internal::Benchmark* benchmark) {
 }
 
 BENCHMARK(BesideVidstab)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
+BENCHMARK(AsSetBesideVidstab)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
+BENCHMARK_CAPTURE(FromBesideVidstab, mkv, ".mkv", {"-c", "copy"})
+    ->Args({1280, 720, 300})
+    ->Apply(Turns);
+BENCHMARK_CAPTURE(FromBesideVidstab, ts, ".ts", {"-c", "copy"})
+    ->Args({1280, 720, 300})
+    ->Apply(Turns);
+BENCHMARK_CAPTURE(FromBesideVidstab, webm, ".webm",
+                  {"-c:v", "libvpx-vp9", "-deadline", "realtime", "-cpu-used", "8", "-crf", "20",
+                   "-b:v", "0"})
+    ->Args({1280, 720, 300})
+    ->Apply(Turns);
+BENCHMARK_CAPTURE(FromBesideVidstab, avi, ".avi", {"-c:v", "mpeg4", "-q:v", "3"})
+    ->Args({1280, 720, 300})
+    ->Apply(Turns);
+BENCHMARK(EncodedBesideTwoDecodesAndAnEncode)->Args({1280, 720, 300})->Apply(Turns);
 BENCHMARK(BesideOpencvTwoPass)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
 BENCHMARK(Choosing)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);
 BENCHMARK(AnotherSmoothness)->Args({1280, 720, 300})->Args({1920, 1080, 300})->Apply(Turns);

@@ -57,6 +57,18 @@ CLI::Option* AddName(CLI::App& command, const std::string& flag, std::string& na
   return command.add_option(flag, name, description)->type_name("NAME");
 }
 
+CLI::Option* AddPairs(CLI::App& command, const std::string& flag, std::vector<std::string>& pairs,
+                      const std::string& description) {
+  const auto check = [](const std::string& text) {
+    const std::size_t sign = text.find('=');
+    return sign != 0 && sign != std::string::npos ? "" : "'" + text + "' is no KEY=VALUE";
+  };
+  return command.add_option(flag, pairs, description)
+      ->check(check)
+      ->type_name("KEY=VALUE")
+      ->allow_extra_args(false);
+}
+
 CLI::Option* AddSwitch(CLI::App& command, const std::string& flag, bool& on,
                        const std::string& description) {
   return command.add_flag(flag, on, description);

@@ -35,6 +35,11 @@ CLI::Option* AddChoice(CLI::App& command, const std::string& flag,
 CLI::Option* AddName(CLI::App& command, const std::string& flag, std::string& name,
                      const std::string& description);
 
+// A flag that can be given again and again, each time with a KEY=VALUE; one without the sign is
+// refused.
+CLI::Option* AddPairs(CLI::App& command, const std::string& flag, std::vector<std::string>& pairs,
+                      const std::string& description);
+
 // A flag without a value.
 CLI::Option* AddSwitch(CLI::App& command, const std::string& flag, bool& on,
                        const std::string& description);

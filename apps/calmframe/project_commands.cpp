@@ -56,7 +56,7 @@ void RenderCommand::Run() {
   const std::unique_ptr<host::Film> film = OpenSaved(project_);
   const media::FrameRange range = RangeOf(*film);
   KeepApart(output_, {project_, film->whole().path});
-  const media::ClipInfo written = media::PartOf(film->whole(), range);
+  const media::ClipInfo written = WrittenAs(media::PartOf(film->whole(), range), flags_);
   const std::unique_ptr<media::ClipWriter> writer =
       media::ClipWriter::Create(output_, written, written.width, written.height, flags_.encode);
   const std::unique_ptr<SideBySide> both =

@@ -77,8 +77,11 @@ class RenderAhead {
         lock.unlock();
         // First, since the render asks for the same one.
         const host::PicturePtr shot = HasShot(frame) ? Shot(frame) : nullptr;
-        host::SteadyFrame steady = host::DrawFrame(*renderer, frame, settings_.depth,
-                                                   clip_.info().field_order, settings_.downsample);
+        // The lines of a smaller frame are of both fields.
+        const media::FieldOrder order =
+            settings_.downsample > 1 ? media::FieldOrder::progressive : clip_.info().field_order;
+        host::SteadyFrame steady =
+            host::DrawFrame(*renderer, frame, settings_.depth, order, settings_.downsample);
         DrawnFrame drawn{std::move(steady.pixels), shot, std::move(steady.banner)};
         lock.lock();
         done_[frame] = std::move(drawn);

@@ -1,5 +1,6 @@
 #include "apps/calmframe/stabilize_command.h"
 
+#include <algorithm>
 #include <cmath>
 #include <memory>
 #include <nlohmann/json.hpp>
@@ -132,6 +133,13 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
       AddName(command, "--codec", flags.encode.codec,
               "Encoder, such as libx265, or the name of what it encodes; at first H.264, or what "
               "the kind of file takes");
+  CLI::Option* const preset = AddName(
+      command, "--preset", flags.encode.preset,
+      "What the encoder calls its preset or speed, or for any that has such a setting ultrafast to "
+      "veryslow; draft for a quick look: half of each side, encoded fast");
+  CLI::Option* const options =
+      AddPairs(command, "--encoder-option", flags.encode.options,
+               "An option of the encoder's own, by FFmpeg's name, such as tune=grain; repeatable");
   CLI::Option* const pixel_format = AddName(
       command, "--pixel-format", flags.encode.pixel_format,
       "Pixel format of the encoder; at first the clip's own alpha, chroma and depth, as far as "
@@ -147,7 +155,7 @@ void AddOutputFlags(CLI::App& command, OutputFlags& flags) {
       "line in any case");
   CLI::Option* const overwrite =
       AddSwitch(command, "--overwrite", flags.encode.overwrite, "Replace OUT where it exists");
-  PutInGroup("Output", {crf, codec, pixel_format, depth, banner, overwrite});
+  PutInGroup("Output", {crf, codec, preset, options, pixel_format, depth, banner, overwrite});
 }
 
 void AddSideBySideFlag(CLI::App& command, OutputFlags& flags) {
@@ -157,8 +165,21 @@ void AddSideBySideFlag(CLI::App& command, OutputFlags& flags) {
                                 Need::optional)});
 }
 
+media::ClipInfo WrittenAs(const media::ClipInfo& clip, const OutputFlags& flags) {
+  media::ClipInfo written = clip;
+  if (flags.is_draft()) {
+    // Even, or players would have to show 4:4:4.
+    for (int* side : {&written.width, &written.height}) *side = std::max(1, *side / 4 * 2);
+    written.field_order = media::FieldOrder::progressive;  // the lines of both fields are mixed
+  }
+  return written;
+}
+
 RenderSettings SettingsOf(const OutputFlags& flags, int threads) {
-  return {.depth = flags.depth, .threads = threads, .warning_banner = flags.warning_banner};
+  return {.depth = flags.depth,
+          .downsample = flags.is_draft() ? 2 : 1,
+          .threads = threads,
+          .warning_banner = flags.warning_banner};
 }
 
 std::unique_ptr<SideBySide> MakeSideBySide(const OutputFlags& flags, const media::ClipInfo& info,
@@ -181,9 +202,10 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
     if (!info.warning.empty()) progress.Warn(info.warning);
     KeepApart(output, {project});
     // Made first, so that an output that cannot be written costs nobody an analysis.
+    const media::ClipInfo written = WrittenAs(info, flags);
     const std::unique_ptr<media::ClipWriter> writer =
-        media::ClipWriter::Create(output, info, info.width, info.height, flags.encode);
-    const std::unique_ptr<SideBySide> both = MakeSideBySide(flags, info, output, {project});
+        media::ClipWriter::Create(output, written, written.width, written.height, flags.encode);
+    const std::unique_ptr<SideBySide> both = MakeSideBySide(flags, written, output, {project});
     TellLosses(*writer, both.get(), progress);
     SteadyFilm(*film, film->range(), project, controls, flags, threads, *writer, both.get(),
                progress);

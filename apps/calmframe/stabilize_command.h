@@ -42,6 +42,8 @@ struct OutputFlags {
   std::string side_by_side;  // a file, of before and after; empty: none
   bool labels_sides = false;
   bool thumbnails = false;  // of one frame, told among what comes out
+
+  bool is_draft() const { return encode.preset == "draft"; }
 };
 void AddOutputFlags(CLI::App& command, OutputFlags& flags);
 // Adds --side-by-side.
@@ -51,6 +53,9 @@ void AddSideBySideFlag(CLI::App& command, OutputFlags& flags);
 std::unique_ptr<SideBySide> MakeSideBySide(const OutputFlags& flags, const media::ClipInfo& info,
                                            const std::string& output,
                                            const std::vector<std::string>& inputs);
+// The clip as its frames are written: of a draft with half of each side, rounded down to an even
+// number of pixels.
+media::ClipInfo WrittenAs(const media::ClipInfo& clip, const OutputFlags& flags);
 RenderSettings SettingsOf(const OutputFlags& flags, int threads);
 
 // From a file to a file; of a stretch only its frames are worked and written. `project`: where

@@ -151,6 +151,11 @@ struct EncodeSettings {
   // Empty: alpha, chroma and depth of the source, as far as encoder and container have them; what
   // they have not is a warning.
   std::string pixel_format;
+  // How much time the encoder takes: what it calls its preset or speed, or for any that has such a
+  // setting one of x264's words (ultrafast to placebo); `draft` is fast for all encoders.
+  std::string preset = {};
+  std::vector<std::string> options =
+      {};  // KEY=VALUE, of the encoder's own; they count over all else
   bool overwrite = false;
   bool video_alone = false;  // nothing of the source's other streams, chapters and tags
 };

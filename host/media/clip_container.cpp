@@ -7,6 +7,7 @@
 #include "host/media/clip_files.h"
 #include "host/media/decoder.h"
 #include "host/media/encoder.h"
+#include "host/media/ffmpeg_log.h"
 #include "host/media/output_choice.h"
 
 namespace calmframe::media {

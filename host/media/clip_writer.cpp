@@ -22,13 +22,14 @@ class FfmpegWriter final : public ClipWriter {
     if (!container_.picture_codec().empty()) encode.codec = container_.picture_codec();
     const AVOutputFormat& format = container_.format();
     encoder_.emplace(container_.shown(), format, source, width, height, encode, warnings_);
-    to_frame_.emplace(encoder_->context().pix_fmt, width, height, encoder_->colour());
+    to_frame_.emplace(encoder_->pixel_format(), width, height, encoder_->colour());
     const auto free = [](AVCodecParameters* of) { avcodec_parameters_free(&of); };
     const std::unique_ptr<AVCodecParameters, decltype(free)> parameters(
         NotNull(avcodec_parameters_alloc()), free);
     if (avcodec_parameters_from_context(parameters.get(), &encoder_->context()) < 0) {
       throw std::bad_alloc();
     }
+    parameters->format = encoder_->pixel_format();  // not what its device makes of it
     if (std::strcmp(format.name, "yuv4mpegpipe") == 0) TagRawFrames(source.colour, *parameters);
     container_.Begin({*parameters, encoder_->time_base(), encoder_->context().framerate,
                       encoder_->context().sample_aspect_ratio},

@@ -5,7 +5,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdarg>
 #include <cstring>
 #include <fstream>
 #include <iterator>
@@ -13,6 +12,7 @@
 #include <string_view>
 
 #include "host/media/clip_files.h"
+#include "host/media/ffmpeg_log.h"
 
 namespace calmframe::media {
 namespace {
@@ -59,14 +59,6 @@ bool LacksIndex(const std::string& file) {
   return is_movie;
 }
 
-// Of a decoder of ours, on any of its threads: its context, or a copy of it, leads to the count.
-void CountComplaint(void* speaker, int level, const char*, va_list) {
-  if (level > AV_LOG_INFO || !speaker) return;
-  if (*static_cast<const AVClass* const*>(speaker) != avcodec_get_class()) return;
-  void* const count = static_cast<AVCodecContext*>(speaker)->opaque;
-  if (count) ++*static_cast<std::atomic<int>*>(count);
-}
-
 // FFmpeg's own decoders of VP8 and VP9 leave out the alpha beside the frames.
 const AVCodec* AlphaDecoderFor(const AVStream& stream) {
   const AVDictionaryEntry* mode = av_dict_get(stream.metadata, "alpha_mode", nullptr, 0);
@@ -99,11 +91,6 @@ std::string DemuxersForClips() {
 }
 
 }  // namespace
-
-void ListenToFfmpeg() {
-  av_log_set_level(AV_LOG_QUIET);
-  av_log_set_callback(CountComplaint);
-}
 
 InputPtr OpenInput(const std::string& path) {
   ListenToFfmpeg();

@@ -18,9 +18,6 @@ InputPtr OpenInput(const std::string& path);
 // The video of a clip that is steadied, of a size that can be. Throws Failure (input).
 AVStream& VideoStreamOf(const AVFormatContext& container, const std::string& path);
 
-// From now on FFmpeg prints nothing, and its decoders' complaints are counted. Any thread.
-void ListenToFfmpeg();
-
 // Frames of a file's first video stream in the order shown. What is damaged is skipped and counted.
 class Decoder {
  public:

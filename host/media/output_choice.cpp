@@ -76,7 +76,8 @@ bool IsInRawFrames(const AVPixFmtDescriptor& layout) {
          std::strncmp(layout.name, "yuvj", 4) != 0;
 }
 
-std::vector<AVPixelFormat> UsableFormats(const AVCodec& codec, const AVOutputFormat& format) {
+std::vector<AVPixelFormat> UsableFormats(const AVCodec& codec, const AVOutputFormat& format,
+                                         const std::vector<AVPixelFormat>& of_device = {}) {
   std::vector<AVPixelFormat> usable;
   const bool jpeg = codec.id == AV_CODEC_ID_MJPEG && HoldsPictures(format);
   // VP8 and VP9 have alpha beside their frames, for which there is a place here alone.
@@ -90,6 +91,10 @@ std::vector<AVPixelFormat> UsableFormats(const AVCodec& codec, const AVOutputFor
       usable.push_back(f);
     }
   };
+  if (!of_device.empty()) {
+    for (const AVPixelFormat f : of_device) add(f);
+    return usable;
+  }
   if (codec.pix_fmts) {
     for (const AVPixelFormat* f = codec.pix_fmts; *f != AV_PIX_FMT_NONE; ++f) add(*f);
     return usable;
@@ -209,8 +214,9 @@ bool IsRgb(const ClipInfo& source) {
 
 AVPixelFormat ChoosePixelFormat(const std::string& shown, const AVCodec& codec,
                                 const AVOutputFormat& format, const ClipInfo& source, int width,
-                                int height, const std::string& asked) {
-  const std::vector<AVPixelFormat> usable = UsableFormats(codec, format);
+                                int height, const std::string& asked,
+                                const std::vector<AVPixelFormat>& of_device) {
+  const std::vector<AVPixelFormat> usable = UsableFormats(codec, format, of_device);
   if (!asked.empty()) {
     const AVPixelFormat known = av_get_pix_fmt(asked.c_str());
     const bool any = !codec.pix_fmts && !HoldsRawFrames(format);

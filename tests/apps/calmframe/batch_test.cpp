@@ -37,7 +37,8 @@ TEST_F(BatchTest, AFolderWithABrokenClipIsSteadiedAndGoneOnWith) {
   MakeClip("c/" + odd, 96, 64, 8);
   MakeClip("c/sub/b.mkv", 64, 96, 8);
   MakeFile("c/broken.mp4", std::string(5000, 'x'));
-  const std::string batch = "batch c --recursive --to c/out --crf 30 ";
+  const std::string batch =
+      "batch c --recursive --to c/out --crf 30 --encoder-option g=7 --encoder-option bf=0 ";
   const Outcome first = Run(batch);
   EXPECT_EQ(first.code, 6);
   for (const char* part :
@@ -50,6 +51,10 @@ TEST_F(BatchTest, AFolderWithABrokenClipIsSteadiedAndGoneOnWith) {
   EXPECT_THAT(In("c/out"), ElementsAre(".calmframe", "a-steady.mp4", "a-steady.mp4.calm",
                                        "batch.html", odd_out, odd_out + ".calm", "sub"));
   EXPECT_THAT(In("c/out/sub"), ElementsAre("b-steady.mkv", "b-steady.mkv.calm"));
+  // What x264 tells of itself.
+  EXPECT_THAT(
+      Content("c/out/a-steady.mp4"),
+      ::testing::AllOf(HasSubstr(" keyint=7 "), HasSubstr(" bframes=0 "), HasSubstr(" crf=30.0 ")));
   // As stabilize has it; lossless, since x264's bytes go by what its memory held before.
   RunWell("stabilize c/a.mp4 alone.mkv --codec ffv1 --quiet --smoothness 20");
   RunWell("batch c/a.mp4 --to one --name '{stem}.mkv' --codec ffv1 --quiet --smoothness 20");

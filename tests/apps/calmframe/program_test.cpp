@@ -279,6 +279,11 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
   }
   ExpectLine("stabilize in.mp4 out.mp4 --codec libx624", 4, "did you mean libx264?");
   ExpectLine("stabilize in.mp4 out.mp4 --pixel-format yuv420", 4, "did you mean yuv420p?");
+  ExpectLine("stabilize in.mp4 out.mp4 --preset slowr", 4, "did you mean slow?");
+  ExpectLine("stabilize in.mp4 out.mp4 --encoder-option tune=grian", 4, "did you mean grain?");
+  if (!fs::exists("/dev/dri")) {
+    ExpectLine("stabilize in.mp4 out.mp4 --codec h264_vaapi", 4, "h264_vaapi");
+  }
   ExpectLine("stabilize in.mp4 no/such/folder.mp4", 4, "there is no folder no/such\n");
   EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "there.mp4"));
   EXPECT_EQ(Content("there.mp4"), "precious");
@@ -309,6 +314,7 @@ TEST_F(ProgramTest, MistypedWordsAreAnsweredWithTheNearest) {
                {"stabilize a b --additional-scale=-inf", "inf"},
                {"stabilize a b --crf x", "'x' is no number"},
                {"stabilize a b --crf", "--crf takes a value"},
+               {"stabilize a b --encoder-option g", "'g' is no KEY=VALUE"},
                {"stabilize a b --depth 12", "none of 8, 16, 32"},
                {"render --project a b --from -3", "0 or more"},
                {"params --param Smothness=3", "did you mean 'Smoothness'?"},

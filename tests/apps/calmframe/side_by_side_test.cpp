@@ -116,5 +116,47 @@ TEST_F(SideBySideTest, TheResultStandsWhateverBecomesOfIt) {
   EXPECT_EQ(ClipReader::Open(Path("y.mkv"))->info().frame_count, 5u);
 }
 
+// Half of the height is odd; and fields, which a smaller frame has not.
+TEST_F(SideBySideTest, ADraftShowsTheSameAtHalfSize) {
+  media::ClipInfo fields = Made(164, 126, 6, 25);
+  fields.field_order = media::FieldOrder::top_first;
+  const auto drift = [](double t) { return Camera{2 * std::sin(1.3 * t), 2 * std::cos(t)}; };
+  for (const media::ClipInfo& info : {Made(164, 126, 6, 25, {16, 11}), fields}) {
+    SCOPED_TRACE(static_cast<int>(info.field_order));
+    MakeWall("in.mkv", info, drift,
+             {.codec = "ffv1", .pixel_format = "yuv444p", .overwrite = true});
+    const std::string run = "stabilize in.mkv --codec ffv1 --quiet --overwrite ";
+    RunWell(run + "whole.mkv");
+    RunWell(run + "half.mkv --preset draft --side-by-side both.mkv");
+    const auto whole = ClipReader::Open(Path("whole.mkv")),
+               half = ClipReader::Open(Path("half.mkv"));
+    ASSERT_EQ(half->info().width, 82);
+    ASSERT_EQ(half->info().height, 62);
+    EXPECT_EQ(half->info().pixel_aspect, info.pixel_aspect);
+    EXPECT_EQ(half->info().field_order, media::FieldOrder::progressive);
+    EXPECT_EQ(half->info().times, whole->info().times);
+    EXPECT_EQ(ClipReader::Open(Path("both.mkv"))->info().width, 164);
+    const auto large = ReadFrame(*whole, 3), small = ReadFrame(*half, 3);
+    // Of a pixel from the mean of the four that it stands for, and from that of its neighbours.
+    const auto difference = [&](int shift) {
+      double sum = 0;
+      for (int y = 4; y < 58; ++y) {
+        for (int x = 4; x < 76; ++x) {
+          const auto green = [&](int at_x, int at_y) {
+            return large[static_cast<std::size_t>(at_y * 164 + at_x)].green;
+          };
+          const int left = 2 * x + shift, top = 2 * y;
+          const double mean = 0.25 * (green(left, top) + green(left + 1, top) +
+                                      green(left, top + 1) + green(left + 1, top + 1));
+          sum += std::abs(small[static_cast<std::size_t>(y * 82 + x)].green - mean);
+        }
+      }
+      return sum / (54 * 72);
+    };
+    EXPECT_LT(difference(0), 0.8 * difference(2));
+    EXPECT_LT(difference(0), 0.8 * difference(-2));
+  }
+}
+
 }  // namespace
 }  // namespace calmframe

@@ -5,6 +5,7 @@
 #include <cmath>
 #include <csignal>
 #include <cstring>
+#include <filesystem>
 #include <sstream>
 
 #include "tests/host/media/clip_fixture.h"
@@ -292,6 +293,71 @@ TEST_F(ClipTest, WhatTheCodecHasOfTheSourceIsKeptAndTheRestIsTold) {
       EXPECT_NEAR(ReadFrame(*written, 1)[99].alpha, 128, 2);
     }
   }
+}
+
+// By what x264 writes of itself into the stream; the numbers of its presets are its manual's.
+TEST_F(ClipTest, EncodersAreSetAsAsked) {
+  const struct {
+    std::string preset;
+    std::vector<std::string> options;
+    const char* says;
+  } cases[] = {{"", {}, "subme=7"},
+               {"", {}, "crf=18.0"},
+               {"ultrafast", {}, "subme=0"},
+               {"draft", {}, "subme=2"},
+               {"slower", {"crf=31"}, "crf=31.0"},
+               {"slower", {}, "subme=9"},
+               {"", {"g=7", "g=9"}, "keyint=9"},
+               {"", {"b=300k"}, "rc=abr"},
+               {"", {"x264-params=ref=2:me=umh"}, "ref=2"}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.says);
+    WriteClip<HX_Pixel16>(In("o.mp4"), Made(96, 64, 3, 25), Gradient{96, 64},
+                          {.codec = "libx264",
+                           .pixel_format = "",
+                           .preset = c.preset,
+                           .options = c.options,
+                           .overwrite = true});
+    EXPECT_THAT(Content("o.mp4"), HasSubstr(std::string(" ") + c.says));
+  }
+}
+
+TEST_F(ClipTest, WhatAnEncoderDoesNotTakeIsToldInOneLine) {
+  const struct {
+    const char *out, *codec, *preset, *option, *says;
+  } cases[] = {{"o.mp4", "", "veryfst", "", "did you mean veryfast?"},
+               {"o.webm", "", "quick", "", "libvpx-vp9 also takes numbers"},
+               {"o.webm", "", "99", "", "option cpu-used of encoder libvpx-vp9 doesn't take '99'"},
+               {"o.mov", "prores", "fast", "", "prores has no such setting"},
+               {"o.mp4", "", "", "crff=3", "has no option 'crff'; did you mean crf?"},
+               {"o.mp4", "", "", "time_base=1/9", "has no option 'time_base'"},
+               {"o.mp4", "", "", "g=often", "option g of encoder libx264 doesn't take 'often'"},
+               {"o.mp4", "", "", "tune=film,grian", "'grian' is none of film, "},
+               {"o.mp4", "", "", "x264-params=nosuch=2", "nosuch"},
+               {"o.mp4", "libx265", "", "x265-params=nosuch=2", "nosuch"},
+               {"o.mkv", "libsvtav1", "", "svtav1-params=nosuch=2", "nosuch"},
+               {"o.mp4", "h264_amf_vulkan", "", "", "built without encoder h264_amf_vulkan"}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.says);
+    const auto create = [&] {
+      std::vector<std::string> options;
+      if (*c.option) options.emplace_back(c.option);
+      ClipWriter::Create(
+          In(c.out), Made(96, 64, 3, 25), 96, 64,
+          {.codec = c.codec, .pixel_format = "", .preset = c.preset, .options = options});
+    };
+    EXPECT_THAT(create, Fails(Failure::Side::output, HasSubstr(c.says)));
+  }
+  EXPECT_TRUE(std::filesystem::is_empty(In("")));
+}
+
+// SVT-AV1 by itself never ends then.
+TEST_F(ClipTest, AWriterThatGetsNoFrameEnds) {
+  for (const char* codec : {"libsvtav1", "libvpx-vp9", "libaom-av1", "libx265"}) {
+    ClipWriter::Create(In("o.mkv"), Made(96, 64, 3, 25), 96, 64,
+                       {.codec = codec, .pixel_format = ""});
+  }
+  EXPECT_TRUE(std::filesystem::is_empty(In("")));
 }
 
 TEST_F(ClipTest, AFullDiskIsToldAndLeavesNothing) {
