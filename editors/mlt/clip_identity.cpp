@@ -37,13 +37,21 @@ std::string ContentOf(const std::string& path) {
 
 }  // namespace
 
+std::string PathOf(mlt_producer producer) {
+  if (!producer) return "";
+  const mlt_properties properties = MLT_PRODUCER_PROPERTIES(mlt_producer_cut_parent(producer));
+  for (const char* name :
+       {"kdenlive:originalurl", "shotcut:originalResource", "warp_resource", "resource"}) {
+    std::string path = TextOf(properties, name);
+    if (!path.empty()) return path;
+  }
+  return "";
+}
+
 std::string IdentityOf(mlt_producer producer) {
   if (!producer) return "";
   const mlt_properties properties = MLT_PRODUCER_PROPERTIES(mlt_producer_cut_parent(producer));
-  std::string path = TextOf(properties, "kdenlive:originalurl");
-  if (path.empty()) path = TextOf(properties, "shotcut:originalResource");
-  if (path.empty()) path = TextOf(properties, "warp_resource");
-  if (path.empty()) path = TextOf(properties, "resource");
+  const std::string path = PathOf(producer);
   std::string identity = ContentOf(path);
   if (identity.empty()) identity = path;
   const double speed = mlt_properties_get_double(properties, "warp_speed");

@@ -147,7 +147,7 @@ class MltTest(unittest.TestCase):
 
     def test_an_analysis_of_a_part_stands_where_it_is(self):
         said, document = self.analyse(self.clip, "part.mlt", "in=5", "out=24")
-        self.assertEqual(self.property_of(document, "results_in"), "5", said)
+        self.assertEqual(self.property_of(document, "results"), "clip.calm@5", said)
         part = self.place("part.mkv")
         subprocess.run(["ffmpeg", "-v", "error", "-i", self.clip, "-vf", "select=between(n\\,5\\,24),setpts=N/25/TB",
                         "-frames:v", "20", "-c:v", "ffv1", part], check=True)
