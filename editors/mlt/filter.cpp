@@ -130,6 +130,11 @@ int GetSized(mlt_frame frame, mlt_image_format* format, int width, int height,
 int FilterState::GetImage(mlt_frame frame, std::uint8_t** image, mlt_image_format* format,
                           int* width, int* height, int writable) {
   const bool is_asked_for = *format != mlt_image_none;
+  if (is_asked_for && (*width <= 0 || *height <= 0)) {  // a consumer that takes any size
+    const mlt_profile profile = mlt_service_profile(MLT_FILTER_SERVICE(filter_));
+    *width = profile->width;
+    *height = profile->height;
+  }
   if (is_asked_for && mlt_properties_get_int(properties(), "analyze") != 0) {
     return Analyse(frame, image, format, width, height, writable);
   }
