@@ -68,6 +68,9 @@ if(TARGET mltcalmframe)
   set_target_properties(mltcalmframe PROPERTIES INSTALL_RPATH "$ORIGIN/..")
   install(TARGETS mltcalmframe DESTINATION "${CMAKE_INSTALL_LIBDIR}/mlt-7" COMPONENT mlt)
   install(FILES editors/mlt/filter_calmframe.yml DESTINATION "${CMAKE_INSTALL_DATADIR}/mlt-7/calmframe" COMPONENT mlt)
+  # Where the editors above it look.
+  install(FILES editors/kdenlive/calmframe.xml DESTINATION "${CMAKE_INSTALL_DATADIR}/kdenlive/effects" COMPONENT mlt)
+  install(DIRECTORY editors/shotcut/calmframe DESTINATION "${CMAKE_INSTALL_DATADIR}/shotcut/qml/filters" COMPONENT mlt)
 endif()
 
 # For hosts of their own.
@@ -132,7 +135,7 @@ Frames are numpy arrays.")
 set(CPACK_DEBIAN_PYTHON_PACKAGE_DEPENDS "${library_package} ${same_version}, python3-numpy, ${CALMFRAME_PYTHON_DEPENDS}")
 set(CPACK_DEBIAN_MLT_PACKAGE_NAME mlt-calmframe)
 set(CPACK_DEBIAN_MLT_DESCRIPTION "${PROJECT_DESCRIPTION}: a filter for MLT\n${what_it_does}\n.\n\
-For melt, and for editors that stand on MLT.")
+For melt and editors that stand on MLT; with panels for Kdenlive and Shotcut.")
 set(CPACK_DEBIAN_MLT_PACKAGE_DEPENDS "${library_package} ${same_version}")
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_STRIP_FILES ON)

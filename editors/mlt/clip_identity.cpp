@@ -37,13 +37,21 @@ std::string ContentOf(const std::string& path) {
 
 }  // namespace
 
+std::string PathOf(mlt_producer producer) {
+  if (!producer) return "";
+  const mlt_properties properties = MLT_PRODUCER_PROPERTIES(mlt_producer_cut_parent(producer));
+  for (const char* name :
+       {"kdenlive:originalurl", "shotcut:originalResource", "warp_resource", "resource"}) {
+    std::string path = TextOf(properties, name);
+    if (!path.empty()) return path;
+  }
+  return "";
+}
+
 std::string IdentityOf(mlt_producer producer) {
   if (!producer) return "";
   const mlt_properties properties = MLT_PRODUCER_PROPERTIES(mlt_producer_cut_parent(producer));
-  std::string path = TextOf(properties, "kdenlive:originalurl");
-  if (path.empty()) path = TextOf(properties, "shotcut:originalResource");
-  if (path.empty()) path = TextOf(properties, "warp_resource");
-  if (path.empty()) path = TextOf(properties, "resource");
+  const std::string path = PathOf(producer);
   std::string identity = ContentOf(path);
   if (identity.empty()) identity = path;
   const double speed = mlt_properties_get_double(properties, "warp_speed");
@@ -53,7 +61,10 @@ std::string IdentityOf(mlt_producer producer) {
   if (const mlt_profile profile = mlt_service_profile(MLT_PRODUCER_SERVICE(parent))) {
     identity.append(" rate ").append(std::to_string(mlt_profile_fps(profile)));
   }
-  if (mlt_service_identify(MLT_PRODUCER_SERVICE(parent)) == mlt_service_chain_type) {
+  // What a chain plays says of itself that it were a chain, where both come from a document; a
+  // chain alone is its own child.
+  if (mlt_service_identify(MLT_PRODUCER_SERVICE(parent)) == mlt_service_chain_type &&
+      parent->child == parent) {
     const auto chain = reinterpret_cast<mlt_chain>(parent);
     for (int i = 0; i < mlt_chain_link_count(chain); ++i) {
       const mlt_properties link = MLT_LINK_PROPERTIES(mlt_chain_link(chain, i));

@@ -6,9 +6,13 @@
 
 namespace calmframe::mlt {
 
-// A text that tells the frames of a producer from those of others: its file's size, first and last
-// bytes, also where an editor has put a smaller stand-in in its place, and what plays it at another
-// speed. In- and out-points and names are no part of it. Without a file it is the resource itself.
+// The file of a producer, also where an editor has put a smaller stand-in in its place; without one
+// the resource itself.
+std::string PathOf(mlt_producer producer);
+
+// A text that tells the frames of a producer from those of others: the size, first and last bytes
+// of the file that PathOf tells, or that text itself, and what plays it at another speed. In- and
+// out-points and names are no part of it.
 std::string IdentityOf(mlt_producer producer);
 
 }  // namespace calmframe::mlt

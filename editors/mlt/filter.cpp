@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <condition_variable>
+#include <filesystem>
 #include <memory>
 #include <mutex>
 #include <new>
@@ -10,6 +11,7 @@
 #include <utility>
 
 #include "editors/mlt/clip_identity.h"
+#include "editors/mlt/results_place.h"
 #include "editors/mlt/steadier.h"
 
 namespace calmframe::mlt {
@@ -128,6 +130,11 @@ int GetSized(mlt_frame frame, mlt_image_format* format, int width, int height,
 int FilterState::GetImage(mlt_frame frame, std::uint8_t** image, mlt_image_format* format,
                           int* width, int* height, int writable) {
   const bool is_asked_for = *format != mlt_image_none;
+  if (is_asked_for && (*width <= 0 || *height <= 0)) {  // a consumer that takes any size
+    const mlt_profile profile = mlt_service_profile(MLT_FILTER_SERVICE(filter_));
+    *width = profile->width;
+    *height = profile->height;
+  }
   if (is_asked_for && mlt_properties_get_int(properties(), "analyze") != 0) {
     return Analyse(frame, image, format, width, height, writable);
   }
@@ -165,10 +172,18 @@ int FilterState::Analyse(mlt_frame frame, std::uint8_t** image, mlt_image_format
     if (analysis) {
       const SessionImage picture(worked, profile->width, profile->height, *image);
       if (analysis->Push(place.source_frame, picture.image())) {
-        const std::string path = Text("filename").empty() ? "calmframe.calm" : Text("filename");
+        ResultsPlace results{Text("filename"), analysis->first()};
+        std::string path = results.path;
+        if (path.empty()) {
+          const std::string folder = ResultsFolder();
+          std::filesystem::create_directories(folder);
+          results.path =
+              ResultsName(PathOf(mlt_frame_get_original_producer(frame)), FramesOf(frame, *profile),
+                          ReadAnalysisControls(properties()), analysis->first(), place.count);
+          path = folder + '/' + results.path;
+        }
         analysis->Save(path);
-        mlt_properties_set_int64(properties(), "results_in", analysis->first());
-        mlt_properties_set(properties(), "results", path.c_str());
+        mlt_properties_set(properties(), "results", TextOf(results).c_str());
         mlt_properties_set_int(properties(), "analyze", 0);
         const std::lock_guard lock(mutex_);
         analysis_.reset();
@@ -227,8 +242,9 @@ std::jthread FilterState::SolveInBackground(const SteadyRequest& request,
 
 std::shared_ptr<Steadier> FilterState::SteadierFor(mlt_frame frame, const mlt_profile_s& profile) {
   SteadyRequest request;
-  request.results = Text("results");
-  request.first = mlt_properties_get_int64(properties(), "results_in");
+  const ResultsPlace results = ResultsPlaceFrom(Text("results"));
+  request.results = FindResults(results.path, PathOf(mlt_frame_get_original_producer(frame)));
+  request.first = results.first;
   request.controls = ReadSolveControls(properties());
   request.identity = IdentityOf(mlt_frame_get_original_producer(frame));
   request.rate_num = profile.frame_rate_num;
@@ -324,7 +340,6 @@ mlt_filter MakeFilter() {
   }
   filter->process = Process;
   filter->close = Close;
-  mlt_properties_set(MLT_FILTER_PROPERTIES(filter), "filename", "calmframe.calm");
   return filter;
 }
 

@@ -147,7 +147,7 @@ class MltTest(unittest.TestCase):
 
     def test_an_analysis_of_a_part_stands_where_it_is(self):
         said, document = self.analyse(self.clip, "part.mlt", "in=5", "out=24")
-        self.assertEqual(self.property_of(document, "results_in"), "5", said)
+        self.assertEqual(self.property_of(document, "results"), "clip.calm@5", said)
         part = self.place("part.mkv")
         subprocess.run(["ffmpeg", "-v", "error", "-i", self.clip, "-vf", "select=between(n\\,5\\,24),setpts=N/25/TB",
                         "-frames:v", "20", "-c:v", "ffv1", part], check=True)
@@ -250,6 +250,54 @@ class MltTest(unittest.TestCase):
         said = self.melt(again, "out=19", "-consumer", "xml:" + self.place("part.mlt"), "all=1", "real_time=-1")
         self.assertFalse(os.path.exists(self.place("clip.calm")), said)
         self.assertEqual(self.property_of(self.place("part.mlt"), "results"), "")
+
+    # What an editor writes: the clip, the filter with the panel's values, and who takes the frames.
+    DOCUMENT = """<?xml version="1.0"?>
+<mlt LC_NUMERIC="C" root="{root}">
+ <profile width="192" height="144" frame_rate_num="25" frame_rate_den="1" progressive="1" colorspace="601"
+  sample_aspect_num="1" sample_aspect_den="1" display_aspect_num="4" display_aspect_den="3"/>
+ {consumer}
+ <{kind} id="clip" out="{last}"><property name="length">30</property><property name="resource">clip.mkv</property>
+  <property name="mlt_service">{service}</property>{inside}</{kind}>
+ <playlist id="main"><entry producer="clip" in="{first}" out="{last}">{on_cut}</entry></playlist>
+</mlt>"""
+
+    def test_jobs_of_editors(self):
+        """Each editor's analysis, of which the property results alone goes into the project."""
+        panel = "".join(f'<property name="{name}">{value}</property>' for name, value in (
+            ("mlt_service", "calmframe"), ("smoothness", "20"), ("method", "position"), ("window", "auto")))
+        steady = self.program(self.clip, "--smoothness", "20", "--method", "position")
+        self.env["XDG_DATA_HOME"] = self.place("user")
+        for kind, service, threads, on_cut in (("producer", "avformat", ' real_time="-1"', True),
+                                               ("chain", "avformat-novalidate", "", False)):
+            with self.subTest(kind):
+                document = self.place("changed.mlt")
+                filter_ = f'<filter out="{FRAMES - 1}">{panel}<property name="analyze">1</property></filter>'
+                values = dict(root=self.folder, kind=kind, service=service, first=0, last=FRAMES - 1)
+                job = self.DOCUMENT.format(**values, inside=filter_, on_cut="", consumer=(
+                    f'<consumer mlt_service="xml" all="1" audio_off="1" no_meta="1"{threads} '
+                    f'resource="{self.place("done.mlt")}"/>'))
+                with open(document, "w", encoding="utf-8") as file:
+                    file.write(job[:job.index(" <playlist")] + "</mlt>")
+                said = self.melt("-abort", "xml:" + document)
+                results = self.property_of(self.place("done.mlt"), "results")
+                self.assertTrue(os.path.exists(self.place("user", "calmframe", results)), said)
+                filter_ = f'<filter>{panel}<property name="results">{results}</property></filter>'
+                with open(document, "w", encoding="utf-8") as file:
+                    file.write(self.DOCUMENT.format(**values, consumer="", inside="" if on_cut else filter_,
+                                                    on_cut=filter_ if on_cut else ""))
+                self.assertEqual(self.render(document)[1], steady)
+                shutil.rmtree(self.place("user"))
+
+    def test_documents_are_of_any_folder(self):
+        _, document = self.analyse(self.clip)
+        self.assertEqual(self.property_of(document, "results"), "clip.calm", "relative to the document's root")
+        os.mkdir(self.place("elsewhere"))
+        out = self.place("out.mkv")
+        subprocess.run(["melt", document, "-consumer", "avformat:" + out, "vcodec=ffv1", "pix_fmt=yuv422p", "an=1",
+                        "real_time=-1"], cwd=self.place("elsewhere"), env=self.env, check=True, timeout=120,
+                       stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+        self.assertEqual(self.frames(out), self.program(self.clip))
 
     def test_twice_on_one_clip(self):
         self.analyse(self.clip)
