@@ -79,28 +79,29 @@ function fit(canvas, width, height) {
   }
 }
 
-// Draws one picture; `both`: it has before above after.
-function paint(canvas, picture, mode, both, divider) {
-  const width = picture.width, height = both ? picture.height / 2 : picture.height;
+// Draws one picture; `both`: it has before above after, or `before` is a picture of its own.
+function paint(canvas, picture, before, mode, both, divider) {
+  const width = picture.width, height = both && !before ? picture.height / 2 : picture.height;
   const context = canvas.getContext('2d', {alpha: false});
   if (!both) {
     fit(canvas, width, height);
     context.drawImage(picture, 0, 0);
     return;
   }
-  const after = [0, height, width, height];
+  const first = before || picture;
+  const after = [0, before ? 0 : height, width, height];
   if (mode === 'side') {
     fit(canvas, 2 * width + 4, height);
     context.fillStyle = '#000';
     context.fillRect(0, 0, canvas.width, height);
-    context.drawImage(picture, 0, 0, width, height, 0, 0, width, height);
+    context.drawImage(first, 0, 0, width, height, 0, 0, width, height);
     context.drawImage(picture, ...after, width + 4, 0, width, height);
     return;
   }
   fit(canvas, width, height);
   context.globalCompositeOperation = 'source-over';
   if (mode === 'difference') {
-    context.drawImage(picture, 0, 0, width, height, 0, 0, width, height);
+    context.drawImage(first, 0, 0, width, height, 0, 0, width, height);
     context.globalCompositeOperation = 'difference';
     context.drawImage(picture, ...after, 0, 0, width, height);
     context.globalCompositeOperation = 'source-over';
@@ -108,7 +109,7 @@ function paint(canvas, picture, mode, both, divider) {
   }
   const left = Math.round(width * divider);
   context.drawImage(picture, ...after, 0, 0, width, height);
-  if (left > 0) context.drawImage(picture, 0, 0, left, height, 0, 0, left, height);
+  if (left > 0) context.drawImage(first, 0, 0, left, height, 0, 0, left, height);
 }
 
 // transport: {frame, speed, range: [in, out], loop}, shared with the page; onFrame(frame): it moved.
@@ -166,7 +167,10 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
       const limit = Math.min(of.info.shown_width, still ? 1920 : WIDEST_PLAYING);
       // In steps, so that a window's size by itself makes no new pictures.
       const width = Math.min(limit, Math.ceil(room / 160) * 160);
-      const address = (frame) => frameAddress(of, side, frame, width);
+      // Apart where it stands still: of a change the steady one alone is fetched.
+      const apart = still && side === 'both';
+      const address = (frame) => frameAddress(of, apart ? 'after' : side, frame, width);
+      const other = apart ? frameAddress(of, 'before', how.frame, width) : '';
       const list = [];
       let onView = address(how.frame);
       if (how.speed) {
@@ -194,18 +198,20 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
       } else {
         stride = 1;
         list.push(onView);
+        if (other) list.push(other);
       }
-      if (!of.stale || !shown) engine.pictures.want(list, how.speed !== 0);
+      engine.pictures.want(list, how.speed !== 0);
       const picture = engine.pictures.get(onView);
+      const before = other && engine.pictures.get(other);
       const key = `${onView} ${wanted} ${engine.divider}`;
-      if (picture && (key !== drawn || dirty)) {
+      if (picture && (!other || before) && (key !== drawn || dirty)) {
         if (onView !== shown) {
           rate.push(now);
           while (rate.length && now - rate[0] > 2000) rate.shift();
         }
         shown = onView;
         drawn = key;
-        paint(canvas.current, picture, wanted, side === 'both', engine.divider);
+        paint(canvas.current, picture, before, wanted, side === 'both', engine.divider);
         canvas.current.dataset.shown = onView;
         canvas.current.dataset.rate = rate.length > 1
           ? ((rate.length - 1) / (now - rate[0]) * 1000).toFixed(1) : '';

@@ -284,14 +284,16 @@ void Studio::Changed(const std::string& id) {
   Flush();
 }
 
-// Many changes at once are one event.
+// Many changes at once are one event; one by itself waits for none.
 void Studio::Flush() {
   if (flushes_) return;
   flushes_ = true;
-  flush_.expires_after(std::chrono::milliseconds(30));
+  constexpr std::chrono::milliseconds kBetween(30);
+  flush_.expires_at(std::max(std::chrono::steady_clock::now(), flushed_at_ + kBetween));
   flush_.async_wait([this](const boost::system::error_code& error) {
     if (error) return;
     flushes_ = false;
+    flushed_at_ = std::chrono::steady_clock::now();
     nlohmann::json event = nlohmann::json::object();
     for (const std::string& id : changed_) {
       if (const Clip* clip = Find(id)) event["clips"][id] = clip->State();

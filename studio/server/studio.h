@@ -2,6 +2,7 @@
 
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/steady_timer.hpp>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <list>
@@ -96,6 +97,7 @@ class Studio {
   bool renders_changed_ = false, order_changed_ = false;
   boost::asio::steady_timer flush_, keep_;
   bool flushes_ = false, keeps_ = false;
+  std::chrono::steady_clock::time_point flushed_at_;
   std::string trouble_;  // what can't be kept, and why
 };
 

@@ -3,10 +3,13 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cstdint>
+#include <cstdlib>
 #include <nlohmann/json.hpp>
 #include <string>
 #include <vector>
 
+#include "host/stabilize/drawing.h"
 #include "host/stabilize/failures.h"
 #include "host/stabilize/film.h"
 #include "platform/hx/hx_controls.h"
@@ -36,6 +39,18 @@ class Onlooker final : public Watcher {
 
 double MostZoom(const ShownPath& path) {
   return *std::max_element(path.output.zooms.begin(), path.output.zooms.end());
+}
+
+// Mean over all bytes.
+double DifferenceOf(const WorldBuffer& one, const WorldBuffer& other) {
+  double sum = 0;
+  const int bytes = 4 * one.world().width;
+  for (int y = 0; y < one.world().height; ++y) {
+    for (int i = 0; i < bytes; ++i) {
+      sum += std::abs(one.row<std::uint8_t>(y)[i] - other.row<std::uint8_t>(y)[i]);
+    }
+  }
+  return sum / bytes / one.world().height;
 }
 
 class SteadyClipTest : public testing::Test {
@@ -133,6 +148,51 @@ TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
   clip.FollowPicture({}, later);
   for (const Candidate& candidate : clip.choice()->candidates) {
     EXPECT_EQ(candidate.changes.count(HX_METHOD.disk_id), 0u) << "set is set: " << candidate.name;
+  }
+}
+
+TEST_F(SteadyClipTest, WhatWasFoundBeforeGivesTheSame) {
+  Onlooker onlooker;
+  const auto follow = [&](SteadyClip& clip, const ParamValues& values) {
+    clip.SetControls(values);
+    clip.Work(onlooker);
+    clip.FollowPicture({.may_choose = false}, onlooker);
+  };
+  const auto draw = [](SteadyClip& clip) {
+    const auto renderer = clip.drawn().MakeRenderer();
+    return DrawFrame(*renderer, 12, 8, media::FieldOrder::progressive).pixels;
+  };
+  Film film(CALMFRAME_PLUGIN, path_);
+  SteadyClip& kept = *film.Next();
+  kept.KeepWhatIsFound();
+  follow(kept, {});
+  film.Keep();
+  const Project saved = film.Saved();
+  for (const ParamValues& values :
+       {ParamValues{{HX_ADDITIONAL_SCALE.disk_id, 130}},
+        ParamValues{{HX_MAXIMUM_SCALE.disk_id, 110}}, ParamValues{{HX_SMOOTHNESS.disk_id, 10}},
+        ParamValues{{HX_FRAMING.disk_id, 4}},
+        ParamValues{{HX_SYNTHESIS_EDGE_FEATHER.disk_id, 30}}}) {
+    const auto before = draw(kept);
+    const bool previews = kept.Preview(values);
+    const auto preview = draw(kept);
+    follow(kept, values);
+    Film anew(CALMFRAME_PLUGIN, saved, path_);
+    SteadyClip& fresh = *anew.Next();
+    fresh.SetControls(kept.Saved().effect.values);
+    follow(fresh, {});
+    const std::int32_t id = values.begin()->first;
+    EXPECT_EQ(kept.choice()->Json(), fresh.choice()->Json()) << id;
+    const auto after = draw(kept);
+    EXPECT_EQ(DifferenceOf(*after, *draw(fresh)), 0) << id;
+    EXPECT_EQ(previews,
+              id == HX_ADDITIONAL_SCALE.disk_id || id == HX_SYNTHESIS_EDGE_FEATHER.disk_id);
+    if (!previews) {
+      EXPECT_EQ(DifferenceOf(*before, *preview), 0) << id;
+    }
+    if (id == HX_ADDITIONAL_SCALE.disk_id) {
+      EXPECT_LT(DifferenceOf(*after, *preview), DifferenceOf(*after, *before) / 10);
+    }
   }
 }
 
