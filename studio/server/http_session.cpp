@@ -107,6 +107,7 @@ class Session : public std::enable_shared_from_this<Session> {
     if (!origin.empty() && !IsOwnOrigin(origin, host)) {
       return Fail(http::status::forbidden, "another page may not speak to the studio");
     }
+    if (path_.empty() || path_[0] != '/') return Fail(http::status::bad_request, "no path");
     const bool posts = request.method() == http::verb::post;
     if (!posts && request.method() != http::verb::get) {
       return Fail(http::status::method_not_allowed, "");
