@@ -27,6 +27,7 @@ constexpr std::int32_t kMethod = HX_METHOD.disk_id;
 constexpr std::int32_t kDeblur = 15;                         // an experts' group, with a checkbox
 constexpr std::int32_t kSynthesisCuts[] = {31, 32, 33, 34};  // pixels taken off each side
 constexpr std::int32_t kAlphaBoost = 283;
+constexpr std::int32_t kShowTracks = 280;
 // What is drawn depends on them, and nothing that is solved or cropped.
 constexpr std::int32_t kDrawnAlone[] = {
     HX_ADDITIONAL_SCALE.disk_id, HX_SYNTHESIS_INPUT_RANGE.disk_id,
@@ -54,6 +55,8 @@ constexpr Trial kTrials[] = {
     {"method position-scale-rotation", HX_METHOD.disk_id, kPositionScaleRotation},
     {"smoothness 10", HX_SMOOTHNESS.disk_id, 10},
 };
+
+constexpr std::int32_t kDeletedTrackBegins = -10;  // see SolvedClip::statuses
 
 // The effect's words for what its status counter tells when it has ended without a result.
 enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
@@ -205,6 +208,7 @@ SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium, cons
   if (!shot) Set(HX_TRANSITION_BISQUARE_SIGMA.disk_id, kTransitionBisquareSigma);
   if (shot) choice_ = Choice::Parse(shot->choice);
   if (choice_) held_ = choice_->still;
+  knows_deleted_ = !shot || held_ != Still::all;
 } catch (const PluginError& error) {
   throw SolveFailure(error.what());
 }
@@ -352,7 +356,9 @@ auto SteadyClip::Keeping(std::int32_t disk_id, const Act& act) {
 Reuse SteadyClip::Work(Watcher& watcher) {
   if (is_worked_) return {true, true, true};
   found_instance_.clear();
-  if (!drawn_) watcher.Redraws();
+  if (!drawn_ || with_tracks_) watcher.Redraws();
+  if (with_tracks_) session_.Remove(*with_tracks_);
+  with_tracks_ = nullptr;
   const Reuse reuse =
       Keeping(HX_FRAMING.disk_id, [&](double framing) { return WorkFramedLast(framing, watcher); });
   is_worked_ = true;
@@ -390,6 +396,8 @@ Reuse SteadyClip::WorkFramedLast(double framing, Watcher& watcher) {
                            path() + ": is gone, and what was made of it doesn't stand any more");
     }
     reuse = {};
+    deleted_.clear();
+    knows_deleted_ = true;
     const CommandResult pressed = effect_->Press(analyze);
     if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
     Settle(watcher, shown, reuse);
@@ -504,9 +512,46 @@ void SteadyClip::HoldStill(Still still, Watcher& watcher) {
 }
 
 void SteadyClip::Leave(const std::vector<TrackPoint>& left_out) {
+  std::vector<TrackPoint> all = left_out;
+  all.insert(all.end(), DeletedTracks().begin(), DeletedTracks().end());
   is_worked_ = false;
-  const CommandResult result = effect_->DeleteTracks(left_out);
+  left_out_ = left_out;
+  const CommandResult result = effect_->DeleteTracks(all);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
+}
+
+void SteadyClip::DeleteTracks(const std::set<TrackPoint>& points) {
+  if (points == DeletedTracks()) return;
+  UndoChoice();
+  deleted_ = points;
+  Leave(left_out_);
+}
+
+const std::set<TrackPoint>& SteadyClip::DeletedTracks() {
+  if (knows_deleted_) return deleted_;
+  knows_deleted_ = true;
+  try {
+    const SolvedClip solved = Solved();
+    for (std::size_t i = 0; i < solved.statuses.size(); ++i) {
+      if (solved.statuses[i] != kDeletedTrackBegins) continue;
+      const auto slots = static_cast<std::size_t>(solved.slots);
+      deleted_.insert({solved.first_frame + static_cast<std::int32_t>(i / slots),
+                       static_cast<std::int32_t>(i % slots)});
+    }
+  } catch (const SolveFailure&) {  // nothing is solved, and nothing deleted
+  }
+  return deleted_;
+}
+
+Effect& SteadyClip::ShowingTracks() {
+  if (with_tracks_) return *with_tracks_;
+  SavedEffect saved;
+  SolvedAndFramed(&saved);
+  saved.values[kShowTracks] = 1;
+  Effect& effect = session_.Load(LayerOfItsOwn(), saved);
+  session_.TickUntilSettled(std::chrono::hours(24));
+  with_tracks_ = &effect;
+  return effect;
 }
 
 void SteadyClip::LeaveOut(Still still, const SolvedClip& solved, const MotionGroups& groups,

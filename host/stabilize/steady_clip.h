@@ -137,6 +137,13 @@ class SteadyClip {
   // not solved, or of which nothing would be seen. It is no choice, and is not saved. Throws
   // Interrupted, SolveFailure.
   void ShowAsFilmed(Watcher& watcher);
+  // Tracks that a person deletes, beside those that HoldStill and FollowPicture leave out; as
+  // Effect::DeleteTracks takes them. What is solved without them is there after the next Work, and
+  // a choice that was made before is undone. Throws SolveFailure.
+  void DeleteTracks(const std::set<TrackPoint>& points);
+  // The same as they are; of saved work those that it holds, unless tracks of a group are left out
+  // of it, which can't be told apart from them. An analysis forgets them.
+  const std::set<TrackPoint>& DeletedTracks();
   // Null where nothing was to choose.
   const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }
   // Made by FollowPicture since it was opened or saved.
@@ -150,6 +157,13 @@ class SteadyClip {
   SavedShot Saved();
   // After Work: what is solved, as it would be saved. Throws SolveFailure.
   SolvedClip Solved();
+
+  // After Work: the same, with what is known of how it moves. Throws SolveFailure.
+  std::shared_ptr<const MovingClip> Found() { return SolvedAndFramed(); }
+  // After Work: what draws the frames as they were filmed, with the effect's own dots on the tracks
+  // that it solves with. It is made when it is first asked for, and goes when there is something to
+  // work; see Watcher::Redraws. Throws SolveFailure.
+  Effect& ShowingTracks();
 
   // After Work. Null where the framing has none.
   std::unique_ptr<CropWindow> Crop();
@@ -192,7 +206,8 @@ class SteadyClip {
   bool IsFree(std::int32_t disk_id) const;
   // The controls as they were given; the tracks that are left out stay so.
   void UndoChoice();
-  // Tracks, out of what is solved from the next Work on. Throws SolveFailure.
+  // Tracks, beside those that are deleted, out of what is solved from the next Work on. Throws
+  // SolveFailure.
   void Leave(const std::vector<TrackPoint>& left_out);
   void LeaveOut(Still still, const SolvedClip& solved, const MotionGroups& groups,
                 Watcher& watcher);
@@ -226,8 +241,12 @@ class SteadyClip {
   double drawn_scale_ = 100;         // Additional Scale that is in them
   std::optional<Choice> choice_;
   bool has_new_choice_ = false;
-  Still held_ = Still::all;     // as a choice or HoldStill has it
-  std::set<std::int32_t> set_;  // disk ids of the parameters that somebody set
+  std::set<TrackPoint> deleted_;      // by a person
+  bool knows_deleted_ = true;         // else saved work may hold some
+  std::vector<TrackPoint> left_out_;  // of a group
+  Effect* with_tracks_ = nullptr;     // the session's
+  Still held_ = Still::all;           // as a choice or HoldStill has it
+  std::set<std::int32_t> set_;        // disk ids of the parameters that somebody set
   bool has_new_controls_ = false;
   bool analysed_ = false;   // anew, and what is solved of it is still to begin
   bool is_worked_ = false;  // Work has nothing to do

@@ -16,7 +16,7 @@ const ICONS = {
   back: icon('M2 1h2v12H2zM12 1v12L5 7z'),
   on: icon('M10 1h2v12h-2zM2 1v12l7-6z'),
 };
-const MODES = ['split', 'side', 'before', 'after', 'difference'];
+const MODES = ['split', 'side', 'before', 'after', 'difference', 'tracks'];
 
 function useTheme() {
   const [theme, setTheme] = useState(localStorage.getItem('theme') || '');
@@ -258,7 +258,7 @@ function App() {
           <${ClipList} studio=${studio} selected=${clip?.id} select=${select} open=${() => setDialog('open')} />
           ${clip && html`
             <main class="centre">
-              <${Player} key=${clip.id} clip=${clip} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} />
+              <${Player} key=${clip.id} clip=${clip} frame=${frame} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} />
               <${Transport} clip=${clip} frame=${frame} transport=${transport} update=${update} mode=${clip.picture ? mode : 'before'} setMode=${setMode} />
               <${Chart} key=${clip.id} clip=${clip} frame=${frame} seek=${(to) => update({seek: to})} theme=${theme} />
             </main>

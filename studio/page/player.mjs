@@ -1,5 +1,6 @@
 // The picture: before and after, playing or still.
 import {html, useEffect, useRef, useState} from './lib/htm-preact.mjs';
+import {Lasso} from './lasso.mjs';
 import {frameAddress} from './link.mjs';
 import {T} from './texts.mjs';
 
@@ -8,7 +9,7 @@ const AT_ONCE = 4;      // requests
 const KEPT = 90;        // decoded pictures
 const WIDEST_PLAYING = 960;
 
-export const SIDES = {split: 'both', side: 'both', difference: 'both', before: 'before', after: 'after'};
+export const SIDES = {split: 'both', side: 'both', difference: 'both', before: 'before', after: 'after', tracks: 'tracks'};
 
 // Pictures by their address, fetched in the order of their need.
 class Pictures {
@@ -113,7 +114,7 @@ function paint(canvas, picture, before, mode, both, divider) {
 }
 
 // transport: {frame, speed, range: [in, out], loop}, shared with the page; onFrame(frame): it moved.
-export function Player({clip, mode, transport, onFrame, onStop}) {
+export function Player({clip, mode, frame, transport, onFrame, onStop}) {
   const box = useRef(), canvas = useRef();
   const live = useRef({});
   const [divider, setDivider] = useState(0.5);
@@ -248,6 +249,7 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
                aria-valuenow=${Math.round(divider * 100)} style=${{left: `${divider * 100}%`}} onKeyDown=${onKey}><span></span></div>
           <span class="tag left">${T.before}</span><span class="tag right">${T.after}</span>`}
         ${mode === 'side' && clip.picture && html`<span class="tag left">${T.before}</span><span class="tag right">${T.after}</span>`}
+        ${mode === 'tracks' && clip.picture && html`<${Lasso} clip=${clip} frame=${frame} playing=${transport.speed !== 0} />`}
         ${clip.stale && html`<span class="tag busy" role="status">${T.updating}</span>`}
       </div>
     </div>`;

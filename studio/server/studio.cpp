@@ -195,6 +195,11 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
     clip.SetWindow(request.at("name").get<std::string>(), request.at("value"));
   } else if (op == "way") {
     clip.TakeWay(request.at("way").get<std::size_t>());
+  } else if (op == "lasso") {
+    *answers_later = true;
+    AskForTracks(clip, request, later);
+  } else if (op == "restore tracks") {
+    clip.RestoreTracks();
   } else if (op == "undo") {
     clip.Undo();
   } else if (op == "redo") {
@@ -245,6 +250,30 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
     throw std::invalid_argument("there is no such operation");
   }
   return nlohmann::json::object();
+}
+
+// What a lasso holds; with "deletes" they are deleted, else shown.
+void Studio::AskForTracks(Clip& clip, const nlohmann::json& request, const Answer& later) {
+  nlohmann::json head = {{"op", "lasso"},
+                         {"frame", request.at("frame").get<std::int64_t>()},
+                         {"any_frame", request.value("any_frame", false)},
+                         {"corners", request.value("corners", std::vector<std::vector<double>>())}};
+  const bool deletes = request.value("deletes", false);
+  Open(clip);
+  clip.Ask(std::move(head), [this, id = clip.id(), deletes, later](const Message& answer) {
+    nlohmann::json said = {{"places", answer.head.value("places", nlohmann::json::array())}};
+    try {
+      if (const std::string error = answer.head.value("error", ""); !error.empty()) {
+        throw std::runtime_error(error);
+      }
+      if (Clip* const asked = Find(id); asked && deletes) {
+        asked->DeleteTracks(answer.head.value("tracks", nlohmann::json::array()));
+      }
+    } catch (const std::exception& error) {
+      said["error"] = error.what();
+    }
+    later(said);
+  });
 }
 
 std::optional<std::uint64_t> Studio::Ask(const std::string& id, nlohmann::json head,

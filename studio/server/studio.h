@@ -68,6 +68,7 @@ class Studio {
   nlohmann::json Act(const nlohmann::json& request, const Answer& later, bool* answers_later);
   nlohmann::json ActOnClip(const std::string& op, Clip& clip, const nlohmann::json& request,
                            const Answer& later, bool* answers_later);
+  void AskForTracks(Clip& clip, const nlohmann::json& request, const Answer& later);
   Clip* Find(const std::string& id) const;
   Clip& At(const nlohmann::json& request) const;
   void Open(Clip& clip);

@@ -75,6 +75,24 @@ nlohmann::json ClipDesk::Curves() {
   return curves_;
 }
 
+void ClipDesk::ShowTracks() {
+  const std::lock_guard lock(mutex_);
+  wants_tracks_ = true;
+  changed_.notify_all();
+}
+
+std::vector<LassoedTrack> ClipDesk::TracksIn(const Lasso& lasso) {
+  std::shared_ptr<const host::MovingClip> found;
+  int fields = 1;
+  {
+    const std::lock_guard lock(mutex_);
+    found = found_;
+    fields = fields_;
+  }
+  if (!found) return {};
+  return studio::TracksIn(lasso, found->clip(), fields);
+}
+
 void ClipDesk::LookAt(std::int64_t frame) {
   const std::lock_guard lock(mutex_);
   looked_at_ = frame;
@@ -111,6 +129,7 @@ ClipDesk::Step ClipDesk::NextStep() {
     } else if (film_->shot() && !whole_ && shot_version_ != version_) {
       return Step::renew;
     }
+    if (wants_tracks_ && is_solved() && film_->shot()) return Step::tracks;
     if (!saves_.empty()) return Step::save;
     return {};
   };

@@ -16,6 +16,7 @@
 #include "host/stabilize/film.h"
 #include "studio/wire/settings.h"
 #include "studio/worker/frame_desk.h"
+#include "studio/worker/lasso.h"
 
 namespace calmframe::studio {
 
@@ -61,6 +62,10 @@ class ClipDesk {
   // Of the shots that are solved, each with "first" and "curves".
   nlohmann::json Curves();
   FrameDesk& frames() { return frames_; }
+  // Somebody looks at the tracks.
+  void ShowTracks();
+  // Of the shot that the lasso's frame is in, where that is open and solved; else none.
+  std::vector<LassoedTrack> TracksIn(const Lasso& lasso);
   // Somebody looks at that frame.
   void LookAt(std::int64_t frame);
 
@@ -80,7 +85,7 @@ class ClipDesk {
     std::string path;
     Done done;
   };
-  enum class Step { end, open, work, preview, renew, look, save, keep };
+  enum class Step { end, open, work, preview, renew, look, tracks, save, keep };
 
   // -- On the thread of Run --
   Step NextStep();
@@ -103,7 +108,8 @@ class ClipDesk {
   };
   Changes ChangesOf(host::SteadyClip& shot, const Settings& settings) const;
   void Apply(host::SteadyClip& shot, const Settings& settings);
-  void ShowPicture(host::SteadyClip& shot, std::uint64_t version);
+  void ShowPicture(host::SteadyClip& shot, std::uint64_t version, bool solved);
+  void ForgetDeleted();
   void KeepResult(host::SteadyClip& shot, std::uint64_t version, bool solved);
   void SaveNow(const SaveRequest& request);
   void TellPanel(host::SteadyClip& shot);
@@ -135,6 +141,9 @@ class ClipDesk {
   std::uint64_t previewed_ = 0;
   std::chrono::steady_clock::time_point steady_at_;
   std::optional<std::int64_t> looked_at_;
+  bool wants_tracks_ = false;
+  int fields_ = 1;                                 // that a frame is of
+  std::shared_ptr<const host::MovingClip> found_;  // of the shot that is shown; may be null
   std::deque<SaveRequest> saves_;
   nlohmann::json panel_ = nlohmann::json::array(), curves_ = nlohmann::json::array();
 

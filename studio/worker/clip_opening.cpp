@@ -122,6 +122,7 @@ Settings ClipDesk::SettingsOfWork(host::SteadyClip& shot) const {
     }
     if (IsChanged(declared, value)) settings.controls[declared.disk_id] = value;
   }
+  settings.deleted = shot.DeletedTracks();
   return settings;
 }
 

@@ -65,6 +65,17 @@ bool ClipDesk::IsOutdated(std::uint64_t version) {
   return ended_ || open_ || version_ != version;
 }
 
+// An analysis has numbered the tracks anew.
+void ClipDesk::ForgetDeleted() {
+  nlohmann::json left;
+  {
+    const std::lock_guard lock(mutex_);
+    settings_.deleted.clear();
+    left = JsonOf(settings_);
+  }
+  tell_({{"settings", std::move(left)}});
+}
+
 void ClipDesk::TellPicture() {
   tell_({{"picture", ++pictures_}, {"shows", shots_[film_->number()].shows}});
 }
@@ -97,6 +108,16 @@ void ClipDesk::Apply(host::SteadyClip& shot, const Settings& settings) {
   const Changes changes = ChangesOf(shot, settings);
   if (!changes.resets.empty()) shot.ResetControls(changes.resets);
   shot.SetControls(changes.values);
+  if (shots_.size() > film_->number() || !settings.deleted.empty()) {
+    std::set<host::TrackPoint> deleted;
+    const std::int64_t fields =
+        film_->whole().field_order == media::FieldOrder::progressive ? 1 : 2;
+    for (const host::TrackPoint& point : settings.deleted) {
+      const auto frame = static_cast<std::size_t>(point.frame / fields);
+      if (frame >= shot.range().first && frame < shot.range().end) deleted.insert(point);
+    }
+    shot.DeleteTracks(deleted);
+  }
   for (const std::int32_t id : changes.resets) applied_.erase(id);
   for (const auto& change : changes.values) {
     applied_.insert(change.first);
@@ -168,14 +189,17 @@ void ClipDesk::Steady(host::SteadyClip& shot) {
   shot.KeepWhatIsFound();
   try {
     Apply(shot, settings);
-    shot.Work(onlooker);
+    if (!shot.Work(onlooker).analysis && !settings.deleted.empty()) {
+      onlooker.Warn("the tracks are new ones; those that were deleted are forgotten");
+      ForgetDeleted();
+    }
     Frame(shot, settings, onlooker);
   } catch (const host::SolveFailure& failure) {
     solved = false;
     onlooker.Warn(std::string(failure.what()) + "; the shot stays as it was filmed");
     shot.ShowAsFilmed(onlooker);
   }
-  ShowPicture(shot, version);
+  ShowPicture(shot, version, solved);
   TellPanel(shot);
   KeepResult(shot, version, solved);
   TellShots();
@@ -184,13 +208,19 @@ void ClipDesk::Steady(host::SteadyClip& shot) {
 }
 
 // Ahead of what is told of it in figures, which takes longer.
-void ClipDesk::ShowPicture(host::SteadyClip& shot, std::uint64_t version) {
+void ClipDesk::ShowPicture(host::SteadyClip& shot, std::uint64_t version, bool solved) {
   frames_.Show(shot);
   const std::size_t number = film_->number();
   if (shots_.size() <= number) shots_.resize(number + 1);
   shots_[number].range = shot.range();
   shots_[number].shows = version;
   TellPicture();
+  {
+    const auto found = solved ? shot.Found() : nullptr;
+    const std::lock_guard lock(mutex_);
+    found_ = found;
+    fields_ = film_->whole().field_order == media::FieldOrder::progressive ? 1 : 2;
+  }
   if (IsOutdated(version)) throw host::Interrupted();
 }
 

@@ -48,6 +48,14 @@ void ClipDesk::Act(Step step) try {
       TellState();
       return;
     }
+    case Step::tracks: {
+      {
+        const std::lock_guard lock(mutex_);
+        wants_tracks_ = false;
+      }
+      if (shots_[film_->number()].solved) frames_.ShowTracks(film_->shot()->ShowingTracks());
+      return;
+    }
     case Step::save: {
       SaveRequest request;
       {

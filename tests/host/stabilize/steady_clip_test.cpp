@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <cstdlib>
 #include <nlohmann/json.hpp>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -194,6 +195,38 @@ TEST_F(SteadyClipTest, WhatWasFoundBeforeGivesTheSame) {
       EXPECT_LT(DifferenceOf(*after, *preview), DifferenceOf(*after, *before) / 10);
     }
   }
+}
+
+TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayOutUntilTheyAreBack) {
+  Onlooker onlooker;
+  const auto count = [](const SolvedClip& clip) {
+    return std::count_if(clip.statuses.begin(), clip.statuses.end(),
+                         [](std::int32_t status) { return status > 0; });
+  };
+  Film film(CALMFRAME_PLUGIN, path_);
+  SteadyClip& clip = *film.Next();
+  clip.Work(onlooker);
+  const SolvedClip all = clip.Solved();
+  std::set<TrackPoint> some;
+  for (std::int32_t slot = 0; slot < all.slots && some.size() < 5; ++slot) {
+    if (all.statuses[static_cast<std::size_t>(slot)] > 0) some.insert({0, slot});
+  }
+  ASSERT_EQ(some.size(), 5u);
+  clip.DeleteTracks(some);
+  EXPECT_EQ(clip.Work(onlooker).Text(), "reused the analysis");
+  EXPECT_EQ(count(clip.Solved()), count(all) - 5);
+  clip.HoldStill(Still::all, onlooker);
+  EXPECT_EQ(count(clip.Solved()), count(all) - 5) << "no group is left out, and these are";
+  film.Keep();
+  const Project saved = film.Saved();
+  Film later(CALMFRAME_PLUGIN, saved, path_);
+  SteadyClip& again = *later.Next();
+  EXPECT_EQ(again.DeletedTracks(), some);
+  again.DeleteTracks(some);
+  EXPECT_TRUE(again.Work(onlooker).solve);
+  again.DeleteTracks({});
+  again.Work(onlooker);
+  EXPECT_EQ(again.Solved().vertices, all.vertices);
 }
 
 TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {
