@@ -117,7 +117,7 @@ ClipDesk::Step ClipDesk::NextStep() {
   const auto now = [&]() -> std::optional<Step> {
     if (ended_) return Step::end;
     if (open_) return Step::open;
-    if (!film_) return {};
+    if (!film_) return saves_.empty() ? std::nullopt : std::optional(Step::save);  // to be refused
     if (wants_work_ && !whole_) return Step::work;
     if (is_solved() && film_->shot()) {
       const Shot& shot = shots_[film_->number()];
