@@ -34,6 +34,7 @@ export const T = {
   otherWays: 'Other ways that were tried',
   takeWay: 'Take this',
   taken: 'shown',
+  unbent: 'By the nearest method: each frame is moved, turned and resized as a whole',
   byHand: 'Set by hand: nothing is chosen beside it.',
   modes: {split: 'Before | after', side: 'Side by side', before: 'Before', after: 'After', difference: 'Difference', tracks: 'Tracks'},
   lasso: 'Tracks of this frame. Draw around some to delete them; Enter makes a rectangle, which arrows move and arrows with shift size.',

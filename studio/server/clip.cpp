@@ -183,6 +183,10 @@ void Clip::TakeWay(std::size_t number) {
   Settings settings = settings_;
   settings.window.as_set = true;
   settings.window.kind = host::WindowSettings::Kind::follow;
+  // As in ByHand.
+  if (!ways[number].value("bends", true)) {
+    settings.controls[HX_METHOD.disk_id] = host::kPositionScaleRotation;
+  }
   const nlohmann::json changes = ways[number].value("changes", nlohmann::json::object());
   for (const auto& [key, value] : changes.items()) {
     settings.controls[std::stoi(key)] = value.get<double>();

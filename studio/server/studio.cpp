@@ -87,8 +87,8 @@ void Studio::Restore() {
       const std::string id = clip.at("id").get<std::string>();
       // Where a clip's roots are closed by now, it is none of this studio's business.
       try {
-        roots_.Existing(clip.value("path", "").empty() ? clip.value("project", "")
-                                                       : clip.value("path", ""));
+        roots_.ExistingClip(clip.value("path", "").empty() ? clip.value("project", "")
+                                                           : clip.value("path", ""));
       } catch (const PathRefused&) {
         continue;
       }
@@ -112,7 +112,7 @@ Clip& Studio::At(const nlohmann::json& request) const {
 }
 
 std::string Studio::Add(const std::string& path) {
-  const std::string place = roots_.Existing(path);
+  const std::string place = roots_.ExistingClip(path);
   for (const std::unique_ptr<Clip>& clip : clips_) {
     if (clip->path() == place) return clip->id();
   }
@@ -162,6 +162,7 @@ nlohmann::json Studio::Act(const nlohmann::json& request, const Answer& later,
                            bool* answers_later) {
   const std::string op = request.at("op").get<std::string>();
   if (op == "add") return {{"clip", Add(request.at("path").get<std::string>())}};
+  if (op == "find") return {{"clip", Add(roots_.Find(request.at("name").get<std::string>()))}};
   if (op == "end render") {
     renders_->Remove(request.at("render").get<std::uint64_t>());
     return nlohmann::json::object();

@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "host/base/param_text.h"
-#include "host/media/clip_files.h"
 #include "platform/hx/hx_controls.h"
 #include "studio/wire/roots.h"
 #include "studio/worker/clip_desk.h"
@@ -94,8 +93,7 @@ void ClipDesk::OpenAnew(host::Opening opening) {
   const host::Project project = host::LoadProject(opened_.project);
   std::string clip = opened_.clip;
   if (clip.empty()) clip = host::FindClip(opened_.project, project);
-  const std::filesystem::path place = clip;
-  Roots(opened_.roots).Existing(media::IsSequence(clip) ? place.parent_path() : place);
+  Roots(opened_.roots).ExistingClip(clip);
   if (host::ContentOf(clip) != project.clip_content) {
     if (opened_.project != opened_.keep) {
       throw host::ProjectFailure(opened_.project + ": is of another clip, " + project.clip_path);
