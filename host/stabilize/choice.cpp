@@ -153,12 +153,12 @@ std::optional<Choice> Choice::Parse(const std::string& text) {
   }
 }
 
-Chooser::Chooser(const SolvedClip& clip, const FollowSettings& settings,
+Chooser::Chooser(const MovingClip& clip, const FollowSettings& settings,
                  const ChoiceWeights& weights)
     : settings_(settings),
       weights_(weights),
-      source_(FindMotion(WarpedPlane(clip, Warps::none))),
-      as_filmed_(MotionOfSource(clip, source_)) {
+      source_(clip.motion(Warps::none)),
+      as_filmed_(MotionOfSource(clip.clip(), *source_)) {
   choice_.most_zoom = settings.most_zoom;
   choice_.zoom_speed = settings.zoom_speed;
 }
@@ -171,10 +171,10 @@ std::vector<Similarity> Chooser::WindowsOf(const Candidate& candidate, const War
   return FollowWindows(plane, motion, settings);
 }
 
-bool Chooser::Consider(Candidate candidate, const SolvedClip& solved, bool by_best_width) {
-  const WarpedPlane plane(solved, candidate.warps);
-  const PictureMotion moved = candidate.warps == Warps::none ? PictureMotion() : FindMotion(plane);
-  const PictureMotion& motion = candidate.warps == Warps::none ? source_ : moved;
+bool Chooser::Consider(Candidate candidate, const MovingClip& solved, bool by_best_width) {
+  const WarpedPlane plane(solved.clip(), candidate.warps);
+  const PictureMotion& motion =
+      candidate.warps == Warps::none ? *source_ : *solved.motion(candidate.warps);
   std::vector<Candidate> tries;
   if (by_best_width) {
     candidate.width_weight = choice_.best().width_weight;
@@ -228,10 +228,10 @@ void Chooser::ConsiderAsFilmed(const SolvedClip& clip) {
   windows_ = std::move(windows);
 }
 
-void Chooser::Take(const Choice& choice, const SolvedClip& solved) {
+void Chooser::Take(const Choice& choice, const MovingClip& solved) {
   choice_ = choice;
-  const WarpedPlane plane(solved, choice_.best().warps);
-  windows_ = WindowsOf(choice_.best(), plane, FindMotion(plane));
+  const WarpedPlane plane(solved.clip(), choice_.best().warps);
+  windows_ = WindowsOf(choice_.best(), plane, *solved.motion(choice_.best().warps));
 }
 
 bool Chooser::leaves_shake() const {

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "host/effects/param_table.h"
+#include "host/stabilize/moving_clip.h"
 #include "host/stabilize/outcome.h"
 
 namespace calmframe::host {
@@ -70,18 +71,18 @@ struct Choice {
 class Chooser {
  public:
   // `clip`: any solve of it, for what the source does.
-  Chooser(const SolvedClip& clip, const FollowSettings& settings,
+  Chooser(const MovingClip& clip, const FollowSettings& settings,
           const ChoiceWeights& weights = {});
 
   // Measures a candidate with a solve of it; true where it is the best so far. Its windows are the
   // best of those that come of some weights of the width, or, `by_best_width`, of the weight of
   // the best so far.
-  bool Consider(Candidate candidate, const SolvedClip& solved, bool by_best_width = false);
+  bool Consider(Candidate candidate, const MovingClip& solved, bool by_best_width = false);
   // After all others: the clip as it was filmed, which is taken where none of them is calmer, or
   // all leave black. What it has ahead of them, its width, counts for nothing.
   void ConsiderAsFilmed(const SolvedClip& clip);
   // The windows of a candidate that was chosen before, with its solve.
-  void Take(const Choice& choice, const SolvedClip& solved);
+  void Take(const Choice& choice, const MovingClip& solved);
 
   const Choice& choice() const { return choice_; }
   // Of the best, as WithWindows takes them.
@@ -98,7 +99,7 @@ class Chooser {
 
   const FollowSettings settings_;
   const ChoiceWeights weights_;
-  const PictureMotion source_;
+  const MovingClip::MotionPtr source_;
   const ShownMotion as_filmed_;
   Choice choice_;
   std::vector<Similarity> windows_;

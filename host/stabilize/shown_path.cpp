@@ -39,12 +39,11 @@ std::vector<WindowPlace> PlacesOf(const WarpedPlane& plane, const std::vector<Si
 
 }  // namespace
 
-ShownPath PathShown(const SolvedClip& clip, Warps warps, const std::vector<Similarity>& windows) {
-  const WarpedPlane rest(clip, Warps::none), plane(clip, warps);
-  const PictureMotion source = FindMotion(rest);
+ShownPath PathShown(const MovingClip& clip, Warps warps, const std::vector<Similarity>& windows) {
+  const WarpedPlane plane(clip.clip(), warps);
   ShownPath path;
-  path.source = MotionOfSource(clip, source);
-  path.output = MotionShown(plane, warps == Warps::none ? source : FindMotion(plane), windows);
+  path.source = MotionOfSource(clip.clip(), *clip.motion(Warps::none));
+  path.output = MotionShown(plane, *clip.motion(warps), windows);
   path.windows = PlacesOf(plane, windows, path.output.aims);
   return path;
 }

@@ -3,6 +3,7 @@
 #include <vector>
 
 #include "host/stabilize/follow_windows.h"
+#include "host/stabilize/moving_clip.h"
 
 namespace calmframe::host {
 
@@ -23,6 +24,6 @@ struct ShownPath {
 };
 
 // Of windows as FollowWindows and OwnWindows have them; most_zoom is the caller's.
-ShownPath PathShown(const SolvedClip& clip, Warps warps, const std::vector<Similarity>& windows);
+ShownPath PathShown(const MovingClip& clip, Warps warps, const std::vector<Similarity>& windows);
 
 }  // namespace calmframe::host

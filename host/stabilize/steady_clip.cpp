@@ -27,6 +27,16 @@ constexpr std::int32_t kMethod = HX_METHOD.disk_id;
 constexpr std::int32_t kDeblur = 15;                         // an experts' group, with a checkbox
 constexpr std::int32_t kSynthesisCuts[] = {31, 32, 33, 34};  // pixels taken off each side
 constexpr std::int32_t kAlphaBoost = 283;
+constexpr std::int32_t kShowTracks = 280;
+// What is drawn depends on them, and nothing that is solved or cropped.
+constexpr std::int32_t kDrawnAlone[] = {
+    HX_ADDITIONAL_SCALE.disk_id, HX_SYNTHESIS_INPUT_RANGE.disk_id,
+    HX_SYNTHESIS_EDGE_FEATHER.disk_id, HX_HIDE_WARNING_BANNER.disk_id, kAlphaBoost};
+
+bool IsDrawnAlone(std::int32_t disk_id) {
+  return std::find(std::begin(kDrawnAlone), std::end(kDrawnAlone), disk_id) !=
+         std::end(kDrawnAlone);
+}
 
 // Where few tracks are, those that leave the others by more than so many pixels of a picture 1000
 // wide count less. Of eight filmed clips' first 6 to 14 frames 2 to 3 kept the most of the width.
@@ -45,6 +55,8 @@ constexpr Trial kTrials[] = {
     {"method position-scale-rotation", HX_METHOD.disk_id, kPositionScaleRotation},
     {"smoothness 10", HX_SMOOTHNESS.disk_id, 10},
 };
+
+constexpr std::int32_t kDeletedTrackBegins = -10;  // see SolvedClip::statuses
 
 // The effect's words for what its status counter tells when it has ended without a result.
 enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
@@ -196,6 +208,7 @@ SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium, cons
   if (!shot) Set(HX_TRANSITION_BISQUARE_SIGMA.disk_id, kTransitionBisquareSigma);
   if (shot) choice_ = Choice::Parse(shot->choice);
   if (choice_) held_ = choice_->still;
+  knows_deleted_ = !shot || held_ != Still::all;
 } catch (const PluginError& error) {
   throw SolveFailure(error.what());
 }
@@ -250,11 +263,10 @@ void SteadyClip::UndoChoice() {
 }
 
 bool SteadyClip::ForgetChoice() {
-  const bool had_one = choice_ || held_ != Still::all;
   UndoChoice();
-  if (held_ != Still::all) effect_->DeleteTracks({});
+  if (held_ != Still::all) Leave({});
   held_ = Still::all;
-  return had_one;
+  return !is_worked_;
 }
 
 void SteadyClip::TakeAsSaved() {
@@ -325,6 +337,7 @@ void SteadyClip::End(Watcher& watcher, Progress& shown) {
 }
 
 void SteadyClip::Set(std::int32_t disk_id, double value) {
+  if (!IsDrawnAlone(disk_id)) is_worked_ = false;
   const CommandResult result = effect_->SetParam(effect_->IndexOf(disk_id), value);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
 }
@@ -341,9 +354,30 @@ auto SteadyClip::Keeping(std::int32_t disk_id, const Act& act) {
 }
 
 Reuse SteadyClip::Work(Watcher& watcher) {
-  DrawByItself();
-  return Keeping(HX_FRAMING.disk_id,
-                 [&](double framing) { return WorkFramedLast(framing, watcher); });
+  if (is_worked_) return {true, true, true};
+  found_instance_.clear();
+  if (!drawn_ || with_tracks_) watcher.Redraws();
+  if (with_tracks_) session_.Remove(*with_tracks_);
+  with_tracks_ = nullptr;
+  const Reuse reuse =
+      Keeping(HX_FRAMING.disk_id, [&](double framing) { return WorkFramedLast(framing, watcher); });
+  is_worked_ = true;
+  return reuse;
+}
+
+bool SteadyClip::Preview(const ParamValues& values) {
+  for (const auto& change : values) {
+    if (!IsDrawnAlone(change.first)) return false;
+  }
+  Effect& shown = drawn();
+  for (const auto& [disk_id, value] : values) {
+    // Windows have the scale that they were found with.
+    const bool is_in_windows = drawn_ && disk_id == HX_ADDITIONAL_SCALE.disk_id;
+    const CommandResult result =
+        shown.SetParam(shown.IndexOf(disk_id), is_in_windows ? value / drawn_scale_ * 100 : value);
+    if (!result.ok()) throw SolveFailure(result.Line(path()));
+  }
+  return true;
 }
 
 Reuse SteadyClip::WorkFramedLast(double framing, Watcher& watcher) {
@@ -362,6 +396,8 @@ Reuse SteadyClip::WorkFramedLast(double framing, Watcher& watcher) {
                            path() + ": is gone, and what was made of it doesn't stand any more");
     }
     reuse = {};
+    deleted_.clear();
+    knows_deleted_ = true;
     const CommandResult pressed = effect_->Press(analyze);
     if (!pressed.ok()) throw SolveFailure(pressed.Line(path()));
     Settle(watcher, shown, reuse);
@@ -391,6 +427,7 @@ void SteadyClip::CheckResult(Watcher& watcher) {
 }
 
 void SteadyClip::SolveAnew(Watcher& watcher) {
+  found_instance_.clear();
   Progress shown;
   Reuse ignored;
   Keeping(kMethod, [&](double value) {
@@ -413,10 +450,26 @@ SolvedClip SteadyClip::Solved() {
   return Solved(*effect_, &saved, path());
 }
 
-SolvedClip SteadyClip::SolvedAndFramed() {
-  SolvedClip solved = Solved();
+std::shared_ptr<const MovingClip> SteadyClip::SolvedAndFramed(SavedEffect* saved) {
+  SavedEffect effect;
+  if (found_of_ && !found_instance_.empty()) {
+    if (saved) {
+      saved->match_name = host_.library().properties().match_name;
+      saved->values = effect_->shared()->params().Values();
+      saved->instance = found_instance_;
+    }
+    return found_of_;
+  }
+  SolvedClip solved = Solved(*effect_, &effect, path());
   if (!Crops(ValueOf(HX_FRAMING.disk_id))) solved.crop.reset();  // from a framing before
-  return solved;
+  const auto moving = found_of_ ? std::make_shared<const MovingClip>(std::move(solved), *found_of_)
+                                : std::make_shared<const MovingClip>(std::move(solved));
+  if (keeps_found_) {
+    found_of_ = moving;
+    found_instance_ = effect.instance;
+  }
+  if (saved) *saved = std::move(effect);
+  return moving;
 }
 
 SolvedClip SteadyClip::Solved(Effect& effect, SavedEffect* saved, const std::string& name) {
@@ -452,9 +505,53 @@ bool SteadyClip::IsFree(std::int32_t disk_id) const {
 }
 
 void SteadyClip::HoldStill(Still still, Watcher& watcher) {
+  DrawByItself(watcher);
   if (still == Still::automatic) return;
   const SolvedClip solved = Solved();
   LeaveOut(still, solved, still == Still::all ? MotionGroups() : FindMotionGroups(solved), watcher);
+}
+
+void SteadyClip::Leave(const std::vector<TrackPoint>& left_out) {
+  std::vector<TrackPoint> all = left_out;
+  all.insert(all.end(), DeletedTracks().begin(), DeletedTracks().end());
+  is_worked_ = false;
+  left_out_ = left_out;
+  const CommandResult result = effect_->DeleteTracks(all);
+  if (!result.ok()) throw SolveFailure(result.Line(path()));
+}
+
+void SteadyClip::DeleteTracks(const std::set<TrackPoint>& points) {
+  if (points == DeletedTracks()) return;
+  UndoChoice();
+  deleted_ = points;
+  Leave(left_out_);
+}
+
+const std::set<TrackPoint>& SteadyClip::DeletedTracks() {
+  if (knows_deleted_) return deleted_;
+  knows_deleted_ = true;
+  try {
+    const SolvedClip solved = Solved();
+    for (std::size_t i = 0; i < solved.statuses.size(); ++i) {
+      if (solved.statuses[i] != kDeletedTrackBegins) continue;
+      const auto slots = static_cast<std::size_t>(solved.slots);
+      deleted_.insert({solved.first_frame + static_cast<std::int32_t>(i / slots),
+                       static_cast<std::int32_t>(i % slots)});
+    }
+  } catch (const SolveFailure&) {  // nothing is solved, and nothing deleted
+  }
+  return deleted_;
+}
+
+Effect& SteadyClip::ShowingTracks() {
+  if (with_tracks_) return *with_tracks_;
+  SavedEffect saved;
+  SolvedAndFramed(&saved);
+  saved.values[kShowTracks] = 1;
+  Effect& effect = session_.Load(LayerOfItsOwn(), saved);
+  session_.TickUntilSettled(std::chrono::hours(24));
+  with_tracks_ = &effect;
+  return effect;
 }
 
 void SteadyClip::LeaveOut(Still still, const SolvedClip& solved, const MotionGroups& groups,
@@ -467,14 +564,12 @@ void SteadyClip::LeaveOut(Still still, const SolvedClip& solved, const MotionGro
   } else if (still == Still::subject) {
     watcher.Warn(path() + ": nothing near moves against what is behind it; no track is left out");
   }
-  const CommandResult result = effect_->DeleteTracks(left_out);
-  if (!result.ok()) throw SolveFailure(result.Line(path()));
+  Leave(left_out);
   held_ = still;
   Work(watcher);
 }
 
 void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
-  DrawByItself();
   const bool stands = choice_ && request.may_choose && choice_->most_zoom == request.most_zoom &&
                       choice_->zoom_speed == request.zoom_speed &&
                       (request.still == Still::automatic || request.still == choice_->still);
@@ -485,7 +580,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
     Work(watcher);
   }
   SavedEffect saved;
-  SolvedClip solved = Solved(*effect_, &saved, path());
+  std::shared_ptr<const MovingClip> solved = SolvedAndFramed(&saved);
   FollowSettings settings;
   settings.most_zoom = request.most_zoom;
   settings.zoom_speed = request.zoom_speed;
@@ -493,33 +588,34 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   settings.enlarged = ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100;
   settings.filling = FillingOfEdges();
   if (stands) {
-    Chooser chooser(solved, settings);
-    chooser.Take(*choice_, solved);
+    Chooser chooser(*solved, settings);
+    chooser.Take(*choice_, *solved);
     return Draw(choice_->best(), chooser.windows(), std::move(saved), watcher);
   }
   const bool as_set = !request.may_choose && request.still == Still::automatic;
   Still still = as_set ? Still::all : request.still;
-  const MotionGroups groups = still == Still::all ? MotionGroups() : FindMotionGroups(solved);
+  const MotionGroups groups =
+      still == Still::all ? MotionGroups() : FindMotionGroups(solved->clip());
   if (still == Still::automatic) {
     constexpr double kCovers = 0.5;  // of the frame: less of the background hardly holds a picture
     still =
         groups.has_subject && groups.background_cover > kCovers ? Still::background : Still::all;
   }
   if (still != Still::all || held_ != Still::all) {
-    LeaveOut(still, solved, groups, watcher);
-    solved = Solved(*effect_, &saved, path());
+    LeaveOut(still, solved->clip(), groups, watcher);
+    solved = SolvedAndFramed(&saved);
   }
-  Chooser chooser(solved, settings);
+  Chooser chooser(*solved, settings);
   Progress progress{.stage = "choosing", .total = 1};
   watcher.Show(progress);
-  chooser.Consider({.name = "as set"}, solved);
+  chooser.Consider({.name = "as set"}, *solved);
   // Whoever asks for a method has its warps; deblurring goes by theirs, too.
   if (request.may_choose && IsFree(kMethod) && ValueOf(kDeblur) == 0) {
-    chooser.Consider({.name = "not bent", .warps = Warps::none}, solved, true);
+    chooser.Consider({.name = "not bent", .warps = Warps::none}, *solved, true);
   }
   Effect* copy = nullptr;
   if (request.may_choose && chooser.leaves_shake()) copy = TryControls(saved, chooser, watcher);
-  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved);
+  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved->clip());
   if (copy && chooser.choice().best().changes.empty()) {  // then the controls stay, too
     session_.Remove(*copy);
   } else if (copy) {
@@ -588,24 +684,29 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
 }
 
 void SteadyClip::BecomeCopy(Effect& copy, Watcher& watcher) {
+  watcher.Redraws();
+  found_instance_.clear();
+  is_worked_ = false;
   session_.Remove(*effect_);
   effect_ = &copy;
   TakeAsSaved();
   Unseen unseen(watcher);
   const double framing = ValueOf(HX_FRAMING.disk_id);
-  if (!Crops(framing)) return;
-  // Its crop window, too, is to be that of the warps as they are saved.
-  Set(HX_FRAMING.disk_id, kStabilizeOnly);
-  Progress shown;
-  Reuse ignored;
-  Settle(unseen, shown, ignored);
-  Set(HX_FRAMING.disk_id, framing);
-  Settle(unseen, shown, ignored);
-  CheckResult(unseen);
+  if (Crops(framing)) {
+    // Its crop window, too, is to be that of the warps as they are saved.
+    Set(HX_FRAMING.disk_id, kStabilizeOnly);
+    Progress shown;
+    Reuse ignored;
+    Settle(unseen, shown, ignored);
+    Set(HX_FRAMING.disk_id, framing);
+    Settle(unseen, shown, ignored);
+    CheckResult(unseen);
+  }
+  is_worked_ = true;
 }
 
 void SteadyClip::ShowAsFilmed(Watcher& watcher) {
-  DrawByItself();
+  DrawByItself(watcher);
   choice_.reset();
   if (Session::StatusOf(*effect_) != kReady) return;  // then the effect passes them through
   SavedEffect saved;
@@ -624,29 +725,39 @@ void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& win
     saved.values[HX_FRAMING.disk_id] = kStabilizeOnly;
   }
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
-  drawn_ = &session_.Load(LayerOfItsOwn(), saved);
-  windows_ = windows;
+  Effect& next = session_.Load(LayerOfItsOwn(), saved);
   session_.TickUntilSettled(std::chrono::hours(24), [&] { return watcher.Stops(); });
-  if (watcher.Stops()) throw Interrupted();
-  const int status = Session::StatusOf(*drawn_);
-  if (status != kReady) throw SolveFailure(path() + ": " + FailureText(status, {}));
+  const int status = Session::StatusOf(next);
+  if (watcher.Stops() || status != kReady) {
+    session_.Remove(next);
+    if (watcher.Stops()) throw Interrupted();
+    throw SolveFailure(path() + ": " + FailureText(status, {}));
+  }
+  watcher.Redraws();
+  DrawByItself(watcher);
+  drawn_ = &next;
+  windows_ = windows;
+  drawn_scale_ = shown.follows ? ValueOf(HX_ADDITIONAL_SCALE.disk_id) : 100;
 }
 
-void SteadyClip::DrawByItself() {
-  if (drawn_) session_.Remove(*drawn_);
+void SteadyClip::DrawByItself(Watcher& watcher) {
+  if (!drawn_) return;
+  watcher.Redraws();
+  session_.Remove(*drawn_);
   drawn_ = nullptr;
   windows_.clear();
 }
 
 Outcome SteadyClip::Measure() {
   if (drawn_ && choice_) return choice_->best().outcome;
-  const SolvedClip solved = SolvedAndFramed();
+  const std::shared_ptr<const MovingClip> moving = SolvedAndFramed();
+  const SolvedClip& solved = moving->clip();
   const double zoom = Zoom(solved);
-  const WarpedPlane plane(solved, Warps::solved), rest(solved, Warps::none);
-  Outcome outcome = MeasureOutcome(
-      MotionOfSource(solved, FindMotion(rest)),
-      MotionShown(plane, FindMotion(plane), OwnWindows(solved, zoom), FillingOfEdges()),
-      FramesPerSecond());
+  const WarpedPlane plane(solved, Warps::solved);
+  Outcome outcome = MeasureOutcome(MotionOfSource(solved, *moving->motion(Warps::none)),
+                                   MotionShown(plane, *moving->motion(Warps::solved),
+                                               OwnWindows(solved, zoom), FillingOfEdges()),
+                                   FramesPerSecond());
   if (solved.crop) {  // the effect draws the window alone, which a maximum scale leaves small
     const double across = std::min(1.0, zoom * solved.crop->width / solved.width);
     const double down = std::min(1.0, zoom * solved.crop->height / solved.height);
@@ -656,10 +767,11 @@ Outcome SteadyClip::Measure() {
 }
 
 ShownPath SteadyClip::Path() {
-  const SolvedClip solved = SolvedAndFramed();
+  const std::shared_ptr<const MovingClip> moving = SolvedAndFramed();
+  const SolvedClip& solved = moving->clip();
   ShownPath path = drawn_ && choice_
-                       ? PathShown(solved, choice_->best().warps, windows_)
-                       : PathShown(solved, Warps::solved, OwnWindows(solved, Zoom(solved)));
+                       ? PathShown(*moving, choice_->best().warps, windows_)
+                       : PathShown(*moving, Warps::solved, OwnWindows(solved, Zoom(solved)));
   path.most_zoom =
       ValueOf(HX_ADDITIONAL_SCALE.disk_id) / 100 *
       (drawn_ && choice_ ? choice_->most_zoom : ValueOf(HX_MAXIMUM_SCALE.disk_id) / 100);

@@ -15,6 +15,7 @@
 #include "host/project/project_file.h"
 #include "host/stabilize/choice.h"
 #include "host/stabilize/motion_groups.h"
+#include "host/stabilize/moving_clip.h"
 #include "host/stabilize/shown_path.h"
 #include "host/stabilize/watcher.h"
 #include "host/timeline/source.h"
@@ -101,12 +102,21 @@ class SteadyClip {
   // What draws the frames: the effect, or where windows follow the picture one that shows these.
   Effect& drawn() { return drawn_ ? *drawn_ : *effect_; }
 
-  // Waits until the effect has analysed and solved the clip, as far as that is to do; from then on
-  // it draws by itself, and no renderer of another one may be left. Once stopped it goes on where
-  // it was. Throws Interrupted, SolveFailure, media::Failure; the last also where a clip that is
-  // gone would have to be analysed; BrokenPromise of a clip that was opened by promises, before
-  // anything is told of how the work ended.
+  // Waits until the effect has analysed and solved the clip, as far as that is to do. What was
+  // drawn before is drawn until its framing is chosen anew, unless that was the effect itself; see
+  // Watcher::Redraws. Once stopped it goes on where it was. Throws Interrupted, SolveFailure,
+  // media::Failure; the last also where a clip that is gone would have to be analysed;
+  // BrokenPromise of a clip that was opened by promises, before anything is told of how the work
+  // ended.
   Reuse Work(Watcher& watcher);
+
+  // Has what is drawn take controls at once, ahead of SetControls, Work and the framing, which may
+  // find its windows anew. False, and nothing is changed, where one of them does more than change
+  // how a frame is drawn. Throws SolveFailure.
+  bool Preview(const ParamValues& values);
+  // Keeps what is found out of a solve for the next framing, measure and path, which then take less
+  // time, and as much memory as the solve.
+  void KeepWhatIsFound() { keeps_found_ = true; }
 
   // Solves once more with the controls as they stand, for what only a running solve tells. Throws
   // as Work.
@@ -119,13 +129,21 @@ class SteadyClip {
   // it. A choice that was made before stands as long as controls and request do. Throws
   // Interrupted, SolveFailure.
   void FollowPicture(const FollowRequest& request, Watcher& watcher);
-  // After Work: solves anew without the tracks of the background or the subject, or with all, as
-  // where there is no subject. Automatic leaves them as they are. Throws as Work.
+  // After Work: the effect draws by itself, solved anew without the tracks of the background or the
+  // subject, or with all, as where there is no subject. Automatic leaves them as they are. Throws
+  // as Work.
   void HoldStill(Still still, Watcher& watcher);
   // From now on the frames are drawn as they were filmed, whatever the framing: of a clip that was
   // not solved, or of which nothing would be seen. It is no choice, and is not saved. Throws
   // Interrupted, SolveFailure.
   void ShowAsFilmed(Watcher& watcher);
+  // Tracks that a person deletes, beside those that HoldStill and FollowPicture leave out; as
+  // Effect::DeleteTracks takes them. What is solved without them is there after the next Work, and
+  // a choice that was made before is undone. Throws SolveFailure.
+  void DeleteTracks(const std::set<TrackPoint>& points);
+  // The same as they are; of saved work those that it holds, unless tracks of a group are left out
+  // of it, which can't be told apart from them. An analysis forgets them.
+  const std::set<TrackPoint>& DeletedTracks();
   // Null where nothing was to choose.
   const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }
   // Made by FollowPicture since it was opened or saved.
@@ -139,6 +157,13 @@ class SteadyClip {
   SavedShot Saved();
   // After Work: what is solved, as it would be saved. Throws SolveFailure.
   SolvedClip Solved();
+
+  // After Work: the same, with what is known of how it moves. Throws SolveFailure.
+  std::shared_ptr<const MovingClip> Found() { return SolvedAndFramed(); }
+  // After Work: what draws the frames as they were filmed, with the effect's own dots on the tracks
+  // that it solves with. It is made when it is first asked for, and goes when there is something to
+  // work; see Watcher::Redraws. Throws SolveFailure.
+  Effect& ShowingTracks();
 
   // After Work. Null where the framing has none.
   std::unique_ptr<CropWindow> Crop();
@@ -173,14 +198,17 @@ class SteadyClip {
   void Set(std::int32_t disk_id, double value);
   // What the effect would save, and what of it is solved. Throws SolveFailure.
   static SolvedClip Solved(Effect& effect, SavedEffect* saved, const std::string& name);
-  // Solved, with a crop only where the framing has one.
-  SolvedClip SolvedAndFramed();
+  // Solved, with a crop only where the framing has one. `saved`, where it isn't null: the effect.
+  std::shared_ptr<const MovingClip> SolvedAndFramed(SavedEffect* saved = nullptr);
   // Of its own, for another effect on the same clip.
   boost::shared_ptr<Layer> LayerOfItsOwn() const;
   // Whether nobody set a parameter, so that it may be chosen.
   bool IsFree(std::int32_t disk_id) const;
   // The controls as they were given; the tracks that are left out stay so.
   void UndoChoice();
+  // Tracks, beside those that are deleted, out of what is solved from the next Work on. Throws
+  // SolveFailure.
+  void Leave(const std::vector<TrackPoint>& left_out);
   void LeaveOut(Still still, const SolvedClip& solved, const MotionGroups& groups,
                 Watcher& watcher);
   // `saved`: the effect. The copy that is better than all considered before; null: none is.
@@ -189,7 +217,7 @@ class SteadyClip {
   void BecomeCopy(Effect& copy, Watcher& watcher);
   void Draw(const Candidate& shown, const std::vector<Similarity>& windows, SavedEffect saved,
             Watcher& watcher);
-  void DrawByItself();
+  void DrawByItself(Watcher& watcher);
   double FramesPerSecond() const;  // fields, of an interlaced clip
   // None of a framing that leaves the edges empty.
   std::optional<Filling> FillingOfEdges() const;
@@ -210,12 +238,21 @@ class SteadyClip {
   Effect* effect_ = nullptr;         // the session's
   Effect* drawn_ = nullptr;          // the session's; null: the effect itself
   std::vector<Similarity> windows_;  // that it shows; none of the effect itself
+  double drawn_scale_ = 100;         // Additional Scale that is in them
   std::optional<Choice> choice_;
   bool has_new_choice_ = false;
-  Still held_ = Still::all;     // as a choice or HoldStill has it
-  std::set<std::int32_t> set_;  // disk ids of the parameters that somebody set
+  std::set<TrackPoint> deleted_;      // by a person
+  bool knows_deleted_ = true;         // else saved work may hold some
+  std::vector<TrackPoint> left_out_;  // of a group
+  Effect* with_tracks_ = nullptr;     // the session's
+  Still held_ = Still::all;           // as a choice or HoldStill has it
+  std::set<std::int32_t> set_;        // disk ids of the parameters that somebody set
   bool has_new_controls_ = false;
-  bool analysed_ = false;  // anew, and what is solved of it is still to begin
+  bool analysed_ = false;   // anew, and what is solved of it is still to begin
+  bool is_worked_ = false;  // Work has nothing to do
+  bool keeps_found_ = false;
+  std::shared_ptr<const MovingClip> found_of_;  // what was saved last; null: nothing is known
+  std::vector<std::uint8_t> found_instance_;    // that it was saved as; empty: it has changed
 };
 
 }  // namespace calmframe::host

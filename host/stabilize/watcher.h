@@ -26,6 +26,8 @@ class Watcher {
   virtual void Warn(const std::string& line) = 0;
   // Whether the work is to end, by Interrupted. Asked often; once true it stays so.
   virtual bool Stops() = 0;
+  // What is drawn by now goes: no renderer of it may be left.
+  virtual void Redraws() {}
 };
 
 }  // namespace calmframe::host

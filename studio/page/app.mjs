@@ -16,7 +16,7 @@ const ICONS = {
   back: icon('M2 1h2v12H2zM12 1v12L5 7z'),
   on: icon('M10 1h2v12h-2zM2 1v12l7-6z'),
 };
-const MODES = ['split', 'side', 'before', 'after', 'difference'];
+const MODES = ['split', 'side', 'before', 'after', 'difference', 'tracks'];
 
 function useTheme() {
   const [theme, setTheme] = useState(localStorage.getItem('theme') || '');
@@ -105,7 +105,7 @@ function Summary({clip}) {
         ${choice.candidates.length > 1 && html`
           <details class="ways"><summary>${T.otherWays}</summary><ul>
             ${choice.candidates.map((way, i) => html`<li class=${way.taken ? 'taken' : ''}><span><b>${way.name}</b><i>${T.shake(way.shake_before.toFixed(1), way.shake_after.toFixed(1))} · ${T.kept(Math.round(way.width_kept * 100))}</i></span>
-              ${way.taken ? html`<em>${T.taken}</em>` : way.bends && way.window === 'follow' ? html`<button class="quiet" onClick=${() => ask({op: 'way', clip: clip.id, way: i})}>${T.takeWay}</button>` : ''}</li>`)}
+              ${way.taken ? html`<em>${T.taken}</em>` : way.window === 'follow' ? html`<button class="quiet" title=${way.bends ? '' : T.unbent} onClick=${() => ask({op: 'way', clip: clip.id, way: i})}>${T.takeWay}</button>` : ''}</li>`)}
           </ul></details>`}`}
       ${clip.settings.window.as_set && clip.state === 'ready' && html`<p class="hint">${T.byHand}</p>`}
       ${(clip.warnings || []).map((line) => html`<p class="warning">${line}</p>`)}
@@ -213,14 +213,16 @@ function App() {
     return () => removeEventListener('keydown', onKey);
   }, []);
 
-  // A name that is dropped; a browser doesn't tell a file's path.
+  // A path that is dropped, or a file, of which a browser tells the name alone.
   const onDrop = async (event) => {
     event.preventDefault();
     const text = event.dataTransfer.getData('text/plain').trim().replace(/^file:\/\//, '');
+    const [file] = event.dataTransfer.files;
     if (text) openPath(decodeURI(text));
+    else if (file) openPath('', file.name);
   };
-  const openPath = async (path) => {
-    const answer = await ask({op: 'add', path});
+  const openPath = async (path, name) => {
+    const answer = await ask(path ? {op: 'add', path} : {op: 'find', name});
     if (answer.error) { setNote(answer.error); return answer.error; }
     setDialog('');
     setNote('');
@@ -258,7 +260,7 @@ function App() {
           <${ClipList} studio=${studio} selected=${clip?.id} select=${select} open=${() => setDialog('open')} />
           ${clip && html`
             <main class="centre">
-              <${Player} key=${clip.id} clip=${clip} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} />
+              <${Player} key=${clip.id} clip=${clip} frame=${frame} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} />
               <${Transport} clip=${clip} frame=${frame} transport=${transport} update=${update} mode=${clip.picture ? mode : 'before'} setMode=${setMode} />
               <${Chart} key=${clip.id} clip=${clip} frame=${frame} seek=${(to) => update({seek: to})} theme=${theme} />
             </main>

@@ -6,15 +6,17 @@ import {T} from './texts.mjs';
 // A value that follows the studio's, but not while a hand is on it.
 function useHeld(value, send) {
   const [held, setHeld] = useState(null);
-  const timer = useRef();
+  const timer = useRef(), sent = useRef(-Infinity);
   useEffect(() => { if (held !== null && Math.abs(held - value) < 1e-9) setHeld(null); }, [value]);
+  // The first change at once, those that follow quickly some 25 a second.
   const change = (next) => {
     setHeld(next);
     clearTimeout(timer.current);
     timer.current = setTimeout(() => {
+      sent.current = performance.now();
       send(next);
       timer.current = setTimeout(() => setHeld(null), 3000);
-    }, 40);
+    }, Math.max(0, sent.current + 40 - performance.now()));
   };
   return [held === null ? value : held, change];
 }

@@ -1,5 +1,6 @@
 // The picture: before and after, playing or still.
 import {html, useEffect, useRef, useState} from './lib/htm-preact.mjs';
+import {Lasso} from './lasso.mjs';
 import {frameAddress} from './link.mjs';
 import {T} from './texts.mjs';
 
@@ -8,7 +9,7 @@ const AT_ONCE = 4;      // requests
 const KEPT = 90;        // decoded pictures
 const WIDEST_PLAYING = 960;
 
-export const SIDES = {split: 'both', side: 'both', difference: 'both', before: 'before', after: 'after'};
+export const SIDES = {split: 'both', side: 'both', difference: 'both', before: 'before', after: 'after', tracks: 'tracks'};
 
 // Pictures by their address, fetched in the order of their need.
 class Pictures {
@@ -79,28 +80,29 @@ function fit(canvas, width, height) {
   }
 }
 
-// Draws one picture; `both`: it has before above after.
-function paint(canvas, picture, mode, both, divider) {
-  const width = picture.width, height = both ? picture.height / 2 : picture.height;
+// Draws one picture; `both`: it has before above after, or `before` is a picture of its own.
+function paint(canvas, picture, before, mode, both, divider) {
+  const width = picture.width, height = both && !before ? picture.height / 2 : picture.height;
   const context = canvas.getContext('2d', {alpha: false});
   if (!both) {
     fit(canvas, width, height);
     context.drawImage(picture, 0, 0);
     return;
   }
-  const after = [0, height, width, height];
+  const first = before || picture;
+  const after = [0, before ? 0 : height, width, height];
   if (mode === 'side') {
     fit(canvas, 2 * width + 4, height);
     context.fillStyle = '#000';
     context.fillRect(0, 0, canvas.width, height);
-    context.drawImage(picture, 0, 0, width, height, 0, 0, width, height);
+    context.drawImage(first, 0, 0, width, height, 0, 0, width, height);
     context.drawImage(picture, ...after, width + 4, 0, width, height);
     return;
   }
   fit(canvas, width, height);
   context.globalCompositeOperation = 'source-over';
   if (mode === 'difference') {
-    context.drawImage(picture, 0, 0, width, height, 0, 0, width, height);
+    context.drawImage(first, 0, 0, width, height, 0, 0, width, height);
     context.globalCompositeOperation = 'difference';
     context.drawImage(picture, ...after, 0, 0, width, height);
     context.globalCompositeOperation = 'source-over';
@@ -108,11 +110,11 @@ function paint(canvas, picture, mode, both, divider) {
   }
   const left = Math.round(width * divider);
   context.drawImage(picture, ...after, 0, 0, width, height);
-  if (left > 0) context.drawImage(picture, 0, 0, left, height, 0, 0, left, height);
+  if (left > 0) context.drawImage(first, 0, 0, left, height, 0, 0, left, height);
 }
 
 // transport: {frame, speed, range: [in, out], loop}, shared with the page; onFrame(frame): it moved.
-export function Player({clip, mode, transport, onFrame, onStop}) {
+export function Player({clip, mode, frame, transport, onFrame, onStop}) {
   const box = useRef(), canvas = useRef();
   const live = useRef({});
   const [divider, setDivider] = useState(0.5);
@@ -166,7 +168,10 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
       const limit = Math.min(of.info.shown_width, still ? 1920 : WIDEST_PLAYING);
       // In steps, so that a window's size by itself makes no new pictures.
       const width = Math.min(limit, Math.ceil(room / 160) * 160);
-      const address = (frame) => frameAddress(of, side, frame, width);
+      // Apart where it stands still: of a change the steady one alone is fetched.
+      const apart = still && side === 'both';
+      const address = (frame) => frameAddress(of, apart ? 'after' : side, frame, width);
+      const other = apart ? frameAddress(of, 'before', how.frame, width) : '';
       const list = [];
       let onView = address(how.frame);
       if (how.speed) {
@@ -194,18 +199,20 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
       } else {
         stride = 1;
         list.push(onView);
+        if (other) list.push(other);
       }
-      if (!of.stale || !shown) engine.pictures.want(list, how.speed !== 0);
+      engine.pictures.want(list, how.speed !== 0);
       const picture = engine.pictures.get(onView);
+      const before = other && engine.pictures.get(other);
       const key = `${onView} ${wanted} ${engine.divider}`;
-      if (picture && (key !== drawn || dirty)) {
+      if (picture && (!other || before) && (key !== drawn || dirty)) {
         if (onView !== shown) {
           rate.push(now);
           while (rate.length && now - rate[0] > 2000) rate.shift();
         }
         shown = onView;
         drawn = key;
-        paint(canvas.current, picture, wanted, side === 'both', engine.divider);
+        paint(canvas.current, picture, before, wanted, side === 'both', engine.divider);
         canvas.current.dataset.shown = onView;
         canvas.current.dataset.rate = rate.length > 1
           ? ((rate.length - 1) / (now - rate[0]) * 1000).toFixed(1) : '';
@@ -242,6 +249,7 @@ export function Player({clip, mode, transport, onFrame, onStop}) {
                aria-valuenow=${Math.round(divider * 100)} style=${{left: `${divider * 100}%`}} onKeyDown=${onKey}><span></span></div>
           <span class="tag left">${T.before}</span><span class="tag right">${T.after}</span>`}
         ${mode === 'side' && clip.picture && html`<span class="tag left">${T.before}</span><span class="tag right">${T.after}</span>`}
+        ${mode === 'tracks' && clip.picture && html`<${Lasso} clip=${clip} frame=${frame} playing=${transport.speed !== 0} />`}
         ${clip.stale && html`<span class="tag busy" role="status">${T.updating}</span>`}
       </div>
     </div>`;

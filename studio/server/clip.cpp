@@ -12,6 +12,8 @@ namespace calmframe::studio {
 namespace {
 
 constexpr std::size_t kMostSteps = 200;
+// Each step keeps them.
+constexpr std::size_t kMostDeleted = 20000;
 
 std::string EndText(int code, const std::string& said) {
   if (code > 128) {
@@ -181,10 +183,29 @@ void Clip::TakeWay(std::size_t number) {
   Settings settings = settings_;
   settings.window.as_set = true;
   settings.window.kind = host::WindowSettings::Kind::follow;
+  // As in ByHand.
+  if (!ways[number].value("bends", true)) {
+    settings.controls[HX_METHOD.disk_id] = host::kPositionScaleRotation;
+  }
   const nlohmann::json changes = ways[number].value("changes", nlohmann::json::object());
   for (const auto& [key, value] : changes.items()) {
     settings.controls[std::stoi(key)] = value.get<double>();
   }
+  Change(std::move(settings), "");
+}
+
+void Clip::DeleteTracks(const nlohmann::json& tracks) {
+  Settings settings = ByHand();
+  settings.deleted.merge(SettingsOf({{"deleted", tracks}}).deleted);
+  if (settings.deleted.size() > kMostDeleted) {
+    throw std::invalid_argument("more tracks than can be deleted one by one");
+  }
+  Change(std::move(settings), "");
+}
+
+void Clip::RestoreTracks() {
+  Settings settings = ByHand();
+  settings.deleted.clear();
   Change(std::move(settings), "");
 }
 
@@ -257,6 +278,9 @@ nlohmann::json Clip::State() const {
   state["path"] = path();
   state["name"] = std::filesystem::path(path()).filename().string();
   state["settings"] = JsonOf(settings_);
+  // Pages have no use for them one by one, and hear this at every change.
+  state["settings"].erase("deleted");
+  state["deleted"] = settings_.deleted.size();
   state["can_undo"] = !undo_.empty();
   state["can_redo"] = !redo_.empty();
   return state;

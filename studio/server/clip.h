@@ -57,6 +57,9 @@ class Clip {
   void SetWindow(const std::string& name, const nlohmann::json& value);
   // Another one of the ways that were tried. Throws std::invalid_argument where there is none.
   void TakeWay(std::size_t number);
+  // Beside those that are; in all no more than kMostDeleted. Throws std::invalid_argument.
+  void DeleteTracks(const nlohmann::json& tracks);
+  void RestoreTracks();
   void Undo();
   void Redo();
 

@@ -107,6 +107,7 @@ class Session : public std::enable_shared_from_this<Session> {
     if (!origin.empty() && !IsOwnOrigin(origin, host)) {
       return Fail(http::status::forbidden, "another page may not speak to the studio");
     }
+    if (path_.empty() || path_[0] != '/') return Fail(http::status::bad_request, "no path");
     const bool posts = request.method() == http::verb::post;
     if (!posts && request.method() != http::verb::get) {
       return Fail(http::status::method_not_allowed, "");
@@ -198,8 +199,9 @@ class Session : public std::enable_shared_from_this<Session> {
         {{"op", "frame"},
          {"frame", NumberIn(query_, "frame", 0)},
          {"width", std::clamp<std::int64_t>(NumberIn(query_, "width", 640), 16, 8192)},
-         {"before", side != "after"},
-         {"after", side != "before"}},
+         {"tracks", side == "tracks"},
+         {"before", side != "after" && side != "tracks"},
+         {"after", side != "before" && side != "tracks"}},
         [](Session& self, const Message& answer) { self.Picture(answer); });
   }
 
@@ -242,9 +244,10 @@ class Session : public std::enable_shared_from_this<Session> {
     if (answer.bytes.empty()) {
       const std::string why = answer.head.value("why", "");
       const std::string error = answer.head.value("error", "");
-      return Json({{"why", why}, {"error", error}}, why == "busy" || why == "shot"
-                                                        ? http::status::service_unavailable
-                                                        : http::status::not_found);
+      return Json({{"why", why}, {"error", error}},
+                  why == "busy" || why == "shot" || why == "tracks"
+                      ? http::status::service_unavailable
+                      : http::status::not_found);
     }
     Response response = Make(http::status::ok, answer.bytes, "image/jpeg");
     // Its address has the number of the version that it shows.

@@ -87,8 +87,8 @@ void Studio::Restore() {
       const std::string id = clip.at("id").get<std::string>();
       // Where a clip's roots are closed by now, it is none of this studio's business.
       try {
-        roots_.Existing(clip.value("path", "").empty() ? clip.value("project", "")
-                                                       : clip.value("path", ""));
+        roots_.ExistingClip(clip.value("path", "").empty() ? clip.value("project", "")
+                                                           : clip.value("path", ""));
       } catch (const PathRefused&) {
         continue;
       }
@@ -112,7 +112,7 @@ Clip& Studio::At(const nlohmann::json& request) const {
 }
 
 std::string Studio::Add(const std::string& path) {
-  const std::string place = roots_.Existing(path);
+  const std::string place = roots_.ExistingClip(path);
   for (const std::unique_ptr<Clip>& clip : clips_) {
     if (clip->path() == place) return clip->id();
   }
@@ -162,6 +162,7 @@ nlohmann::json Studio::Act(const nlohmann::json& request, const Answer& later,
                            bool* answers_later) {
   const std::string op = request.at("op").get<std::string>();
   if (op == "add") return {{"clip", Add(request.at("path").get<std::string>())}};
+  if (op == "find") return {{"clip", Add(roots_.Find(request.at("name").get<std::string>()))}};
   if (op == "end render") {
     renders_->Remove(request.at("render").get<std::uint64_t>());
     return nlohmann::json::object();
@@ -195,6 +196,11 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
     clip.SetWindow(request.at("name").get<std::string>(), request.at("value"));
   } else if (op == "way") {
     clip.TakeWay(request.at("way").get<std::size_t>());
+  } else if (op == "lasso") {
+    *answers_later = true;
+    AskForTracks(clip, request, later);
+  } else if (op == "restore tracks") {
+    clip.RestoreTracks();
   } else if (op == "undo") {
     clip.Undo();
   } else if (op == "redo") {
@@ -247,6 +253,30 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
   return nlohmann::json::object();
 }
 
+// What a lasso holds; with "deletes" they are deleted, else shown.
+void Studio::AskForTracks(Clip& clip, const nlohmann::json& request, const Answer& later) {
+  nlohmann::json head = {{"op", "lasso"},
+                         {"frame", request.at("frame").get<std::int64_t>()},
+                         {"any_frame", request.value("any_frame", false)},
+                         {"corners", request.value("corners", std::vector<std::vector<double>>())}};
+  const bool deletes = request.value("deletes", false);
+  Open(clip);
+  clip.Ask(std::move(head), [this, id = clip.id(), deletes, later](const Message& answer) {
+    nlohmann::json said = {{"places", answer.head.value("places", nlohmann::json::array())}};
+    try {
+      if (const std::string error = answer.head.value("error", ""); !error.empty()) {
+        throw std::runtime_error(error);
+      }
+      if (Clip* const asked = Find(id); asked && deletes) {
+        asked->DeleteTracks(answer.head.value("tracks", nlohmann::json::array()));
+      }
+    } catch (const std::exception& error) {
+      said["error"] = error.what();
+    }
+    later(said);
+  });
+}
+
 std::optional<std::uint64_t> Studio::Ask(const std::string& id, nlohmann::json head,
                                          Clip::Reply reply) {
   Clip* const clip = Find(id);
@@ -284,14 +314,16 @@ void Studio::Changed(const std::string& id) {
   Flush();
 }
 
-// Many changes at once are one event.
+// Many changes at once are one event; one by itself waits for none.
 void Studio::Flush() {
   if (flushes_) return;
   flushes_ = true;
-  flush_.expires_after(std::chrono::milliseconds(30));
+  constexpr std::chrono::milliseconds kBetween(30);
+  flush_.expires_at(std::max(std::chrono::steady_clock::now(), flushed_at_ + kBetween));
   flush_.async_wait([this](const boost::system::error_code& error) {
     if (error) return;
     flushes_ = false;
+    flushed_at_ = std::chrono::steady_clock::now();
     nlohmann::json event = nlohmann::json::object();
     for (const std::string& id : changed_) {
       if (const Clip* clip = Find(id)) event["clips"][id] = clip->State();

@@ -2,6 +2,7 @@
 
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/steady_timer.hpp>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <list>
@@ -67,6 +68,7 @@ class Studio {
   nlohmann::json Act(const nlohmann::json& request, const Answer& later, bool* answers_later);
   nlohmann::json ActOnClip(const std::string& op, Clip& clip, const nlohmann::json& request,
                            const Answer& later, bool* answers_later);
+  void AskForTracks(Clip& clip, const nlohmann::json& request, const Answer& later);
   Clip* Find(const std::string& id) const;
   Clip& At(const nlohmann::json& request) const;
   void Open(Clip& clip);
@@ -96,6 +98,7 @@ class Studio {
   bool renders_changed_ = false, order_changed_ = false;
   boost::asio::steady_timer flush_, keep_;
   bool flushes_ = false, keeps_ = false;
+  std::chrono::steady_clock::time_point flushed_at_;
   std::string trouble_;  // what can't be kept, and why
 };
 

@@ -101,7 +101,7 @@ void WorkerProcess::Read() {
       while (std::optional<Message> message = self->reader_.Next()) {
         if (self->events_.message) self->events_.message(std::move(*message));
       }
-    } catch (const BadMessage&) {
+    } catch (const std::exception&) {  // no message, or one that makes no sense
       error_code ignored;
       self->socket_.shutdown(boost::asio::local::stream_protocol::socket::shutdown_both, ignored);
       return;

@@ -3,10 +3,15 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
+#include <deque>
 #include <filesystem>
 #include <nlohmann/json.hpp>
+#include <set>
 #include <string_view>
 #include <system_error>
+#include <utility>
+
+#include "host/media/clip_files.h"
 
 namespace calmframe::studio {
 namespace {
@@ -14,6 +19,9 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr std::size_t kMostListed = 5000;
+// Files, and folders below a root, that a name is looked for in: no longer than a person waits.
+constexpr std::size_t kMostLooked = 50000;
+constexpr int kDeepest = 8;
 constexpr std::string_view kProject = ".calm";
 // A name tells what a list offers; whatever is typed is tried.
 constexpr std::array<std::string_view, 20> kClips = {
@@ -59,6 +67,47 @@ std::string Roots::Existing(const std::string& path) const {
   const fs::path canonical = fs::canonical(path, error);
   if (error || !Holds(canonical)) throw PathRefused(refusal);
   return canonical;
+}
+
+std::string Roots::ExistingClip(const std::string& path) const {
+  if (path.find('\0') != std::string::npos || !media::IsSequence(path)) return Existing(path);
+  const fs::path given(path);
+  return fs::path(Existing(given.parent_path())) / given.filename();
+}
+
+std::string Roots::Find(const std::string& name) const {
+  const std::string refusal = name + ": isn't in the folders that are open";
+  if (name.empty() || name.find('/') != std::string::npos || name[0] == '.') {
+    throw PathRefused(refusal);
+  }
+  std::set<std::string> found, seen;
+  std::deque<std::pair<fs::path, int>> folders;
+  for (const std::string& root : folders_) folders.emplace_back(root, 0);
+  for (std::size_t looked = 0; !folders.empty() && looked < kMostLooked;) {
+    const auto [folder, depth] = folders.front();
+    folders.pop_front();
+    if (!seen.insert(folder).second) continue;
+    std::error_code error;
+    for (fs::directory_iterator entry(folder, error), end; !error && entry != end;
+         entry.increment(error)) {
+      if (++looked > kMostLooked) break;
+      const std::string is = entry->path().filename();
+      if (is[0] == '.') continue;
+      std::error_code ignored;
+      if (entry->is_directory(ignored) && !entry->is_symlink(ignored)) {
+        if (depth < kDeepest) folders.emplace_back(entry->path(), depth + 1);
+      } else if (is == name) {
+        const fs::path canonical = fs::canonical(entry->path(), ignored);
+        if (!ignored && Holds(canonical)) found.insert(canonical);
+      }
+    }
+  }
+  if (found.empty()) throw PathRefused(refusal);
+  if (found.size() > 1) {
+    throw PathRefused(name + ": is there " + std::to_string(found.size()) +
+                      " times; open the one that is meant by its path");
+  }
+  return *found.begin();
 }
 
 std::string Roots::ToWrite(const std::string& path) const {

@@ -23,6 +23,12 @@ class Roots {
 
   // What is there, links followed. Throws PathRefused.
   std::string Existing(const std::string& path) const;
+  // The same of a clip, which may be pictures whose names have a number: then their folder is
+  // there. Throws PathRefused.
+  std::string ExistingClip(const std::string& path) const;
+  // The only file of that name in the folders and those below them, links to folders not followed.
+  // Throws PathRefused.
+  std::string Find(const std::string& name) const;
   // A file to be written, in a folder that is there. Throws PathRefused.
   std::string ToWrite(const std::string& path) const;
   // {"path", "parent" (null above a root), "folders": [names], "files": [{"name", "bytes",

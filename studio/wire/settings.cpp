@@ -3,6 +3,7 @@
 #include <array>
 #include <charconv>
 #include <cmath>
+#include <limits>
 #include <nlohmann/json.hpp>
 #include <stdexcept>
 #include <string>
@@ -57,6 +58,9 @@ nlohmann::json JsonOf(const Settings& settings) {
   if (window.zoom_speed) shown["zoom_speed"] = *window.zoom_speed;
   if (window.still != Still::automatic) shown["still"] = NameOf(kStills, window.still);
   if (window.as_set) shown["as_set"] = true;
+  for (const host::TrackPoint& point : settings.deleted) {
+    json["deleted"].push_back({point.frame, point.slot});
+  }
   return json;
 }
 
@@ -82,6 +86,17 @@ Settings SettingsOf(const nlohmann::json& json) {
     if (key == "most_zoom") settings.window.most_zoom = NumberOf(value, "zoom at most", 1, 100);
     if (key == "zoom_speed") settings.window.zoom_speed = NumberOf(value, "zoom speed", 0, 1000);
     if (key == "as_set") settings.window.as_set = value == true;
+  }
+  const nlohmann::json deleted = json.value("deleted", nlohmann::json::array());
+  if (!deleted.is_array()) throw std::invalid_argument("deleted tracks are a list");
+  for (const nlohmann::json& point : deleted) {
+    if (!point.is_array() || point.size() != 2) {
+      throw std::invalid_argument("a track is a frame and a slot");
+    }
+    constexpr double kMost = std::numeric_limits<std::int32_t>::max();
+    settings.deleted.insert(
+        {static_cast<std::int32_t>(NumberOf(point[0], "a track's frame", 0, kMost)),
+         static_cast<std::int32_t>(NumberOf(point[1], "a track's slot", 0, kMost))});
   }
   return settings;
 }

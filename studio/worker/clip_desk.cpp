@@ -75,6 +75,24 @@ nlohmann::json ClipDesk::Curves() {
   return curves_;
 }
 
+void ClipDesk::ShowTracks() {
+  const std::lock_guard lock(mutex_);
+  wants_tracks_ = true;
+  changed_.notify_all();
+}
+
+std::vector<LassoedTrack> ClipDesk::TracksIn(const Lasso& lasso) {
+  std::shared_ptr<const host::MovingClip> found;
+  int fields = 1;
+  {
+    const std::lock_guard lock(mutex_);
+    found = found_;
+    fields = fields_;
+  }
+  if (!found) return {};
+  return studio::TracksIn(lasso, found->clip(), fields);
+}
+
 void ClipDesk::LookAt(std::int64_t frame) {
   const std::lock_guard lock(mutex_);
   looked_at_ = frame;
@@ -99,25 +117,37 @@ ClipDesk::Step ClipDesk::NextStep() {
   const auto now = [&]() -> std::optional<Step> {
     if (ended_) return Step::end;
     if (open_) return Step::open;
-    if (!film_) return {};
+    if (!film_) return saves_.empty() ? std::nullopt : std::optional(Step::save);  // to be refused
     if (wants_work_ && !whole_) return Step::work;
     if (is_solved() && film_->shot()) {
       const Shot& shot = shots_[film_->number()];
-      if (shot.version != version_ && given_up_ != version_) return Step::renew;
+      if (shot.version != version_ && given_up_ != version_) {
+        return previewed_ == version_ ? Step::renew : Step::preview;
+      }
       const auto looked_at = looked_at_ ? ShotAt(*looked_at_) : std::nullopt;
       if (looked_at && *looked_at != film_->number()) return Step::look;
     } else if (film_->shot() && !whole_ && shot_version_ != version_) {
       return Step::renew;
     }
+    if (wants_tracks_ && is_solved() && film_->shot()) return Step::tracks;
     if (!saves_.empty()) return Step::save;
     return {};
   };
-  std::optional<Step> step;
-  const auto is_there = [&] { return (step = now()).has_value(); };
-  if (!changed_.wait_for(lock, is_kept_ ? std::chrono::hours(24) : kPause, is_there)) {
-    return is_kept_ ? Step::look : Step::keep;
+  using Clock = std::chrono::steady_clock;
+  const Clock::time_point keep_at = Clock::now() + (is_kept_ ? std::chrono::hours(24) : kPause);
+  while (true) {
+    const std::optional<Step> step = now();
+    const Clock::time_point time = Clock::now();
+    if (step == Step::renew && steady_at_ > time) {
+      changed_.wait_until(lock, steady_at_);
+    } else if (step) {
+      return *step;
+    } else if (time >= keep_at) {
+      return is_kept_ ? Step::look : Step::keep;
+    } else {
+      changed_.wait_until(lock, keep_at);
+    }
   }
-  return *step;
 }
 
 void ClipDesk::Run() {

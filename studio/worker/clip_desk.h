@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <deque>
@@ -15,6 +16,7 @@
 #include "host/stabilize/film.h"
 #include "studio/wire/settings.h"
 #include "studio/worker/frame_desk.h"
+#include "studio/worker/lasso.h"
 
 namespace calmframe::studio {
 
@@ -60,6 +62,10 @@ class ClipDesk {
   // Of the shots that are solved, each with "first" and "curves".
   nlohmann::json Curves();
   FrameDesk& frames() { return frames_; }
+  // Somebody looks at the tracks.
+  void ShowTracks();
+  // Of the shot that the lasso's frame is in, where that is open and solved; else none.
+  std::vector<LassoedTrack> TracksIn(const Lasso& lasso);
   // Somebody looks at that frame.
   void LookAt(std::int64_t frame);
 
@@ -69,7 +75,8 @@ class ClipDesk {
   class Onlooker;
   struct Shot {
     media::FrameRange range;
-    std::uint64_t version = 0;  // of the settings that it was steadied with
+    std::uint64_t version = 0;  // of the settings that all below tells of
+    std::uint64_t shows = 0;    // of those that its frames are drawn by
     bool solved = false;
     host::Outcome outcome;
     nlohmann::json choice, curves;
@@ -78,7 +85,7 @@ class ClipDesk {
     std::string path;
     Done done;
   };
-  enum class Step { end, open, work, renew, look, save, keep };
+  enum class Step { end, open, work, preview, renew, look, tracks, save, keep };
 
   // -- On the thread of Run --
   Step NextStep();
@@ -89,15 +96,30 @@ class ClipDesk {
   void OpenShot(std::size_t number);
   // Works and frames the open shot by the settings as they are now.
   void Steady(host::SteadyClip& shot);
+  // Draws by the settings as they are now what needs no more than that.
+  void Preview(host::SteadyClip& shot);
+  // Whether it ends for what was asked for since, even if nobody cancelled it.
+  bool IsOutdated(std::uint64_t version);
   void Frame(host::SteadyClip& shot, const Settings& settings, Onlooker& onlooker);
+  // What the settings ask for beside what the shot has.
+  struct Changes {
+    host::ParamValues values;
+    std::set<std::int32_t> resets;
+  };
+  Changes ChangesOf(host::SteadyClip& shot, const Settings& settings) const;
   void Apply(host::SteadyClip& shot, const Settings& settings);
+  void ShowPicture(host::SteadyClip& shot, std::uint64_t version, bool solved);
+  void ForgetDeleted();
   void KeepResult(host::SteadyClip& shot, std::uint64_t version, bool solved);
   void SaveNow(const SaveRequest& request);
   void TellPanel(host::SteadyClip& shot);
   void TellShots();
+  void TellPicture();
   void TellState();
   void Fail(const std::string& line);
   Settings SettingsOfWork(host::SteadyClip& shot) const;
+  static double RateOf(const media::ClipInfo& info);
+  static nlohmann::json InfoOf(const media::ClipInfo& info);
 
   std::optional<std::size_t> ShotAt(std::int64_t frame) const;
   bool is_solved() const { return film_ && whole_ && !shots_.empty(); }
@@ -115,7 +137,13 @@ class ClipDesk {
   bool cancelled_ = false;          // until something else is wanted
   std::uint64_t given_up_ = 0;      // version whose work was cancelled
   std::uint64_t shot_version_ = 0;  // that the open shot was given
+  // Version that Preview has had, and when a shot is to be steadied by it.
+  std::uint64_t previewed_ = 0;
+  std::chrono::steady_clock::time_point steady_at_;
   std::optional<std::int64_t> looked_at_;
+  bool wants_tracks_ = false;
+  int fields_ = 1;                                 // that a frame is of
+  std::shared_ptr<const host::MovingClip> found_;  // of the shot that is shown; may be null
   std::deque<SaveRequest> saves_;
   nlohmann::json panel_ = nlohmann::json::array(), curves_ = nlohmann::json::array();
 

@@ -47,7 +47,7 @@ class FrameDesk::Artist {
       if (!shot) throw std::runtime_error("the clip has no such frame");
       views.push_back(PictureOf(*shot));
     }
-    if (request.after) {
+    if (request.after || request.tracks) {
       const int downsample = std::max(1, clip.width / width);
       steady = host::DrawFrame(*renderer, frame_of_shot, kDepth, clip.field_order, downsample);
       views.push_back(PictureOf(*steady.pixels));
@@ -86,15 +86,21 @@ void FrameDesk::Show(host::SteadyClip& shot) {
   constexpr int kThreadsAhead = 4;
   host::PrepareDrawing(shot, kDepth, kThreadsAhead, false);
   const std::lock_guard lock(mutex_);
-  drawn_ = &shot.drawn();
+  steady_.effect = &shot.drawn();
   range_ = shot.range();
+}
+
+void FrameDesk::ShowTracks(host::Effect& effect) {
+  const std::lock_guard lock(mutex_);
+  tracks_.effect = &effect;
 }
 
 void FrameDesk::Hide() {
   std::unique_lock lock(mutex_);
-  drawn_ = nullptr;
+  steady_.effect = tracks_.effect = nullptr;
   changed_.wait(lock, [this] { return users_ == 0; });
-  idle_.clear();
+  steady_.idle.clear();
+  tracks_.idle.clear();
 }
 
 void FrameDesk::Ask(std::uint64_t id, const FrameRequest& request, Reply reply) {
@@ -137,40 +143,44 @@ void FrameDesk::Draw(const Asked& asked, Artist& artist) {
   const host::SourcePtr source = source_;
   const media::ClipInfo whole = whole_;
   const auto frame = static_cast<std::size_t>(std::max<std::int64_t>(request.frame, 0));
+  const bool renders = request.after || request.tracks;
+  Drawn& drawn = request.tracks ? tracks_ : steady_;
   NoFrame why = NoFrame::none;
   if (!source) {
     why = NoFrame::busy;
-  } else if (request.after && !drawn_) {
+  } else if (renders && !steady_.effect) {
     why = NoFrame::busy;
-  } else if (request.after && (frame < range_.first || frame >= range_.end)) {
+  } else if (renders && (frame < range_.first || frame >= range_.end)) {
     why = NoFrame::shot;
+  } else if (renders && !drawn.effect) {
+    why = NoFrame::tracks;
   }
   if (why != NoFrame::none) {
     lock.unlock();
     return asked.reply({}, why, "");
   }
   const std::int64_t frame_of_shot =
-      request.frame - static_cast<std::int64_t>(request.after ? range_.first : 0);
-  host::Effect* const drawn = drawn_;
-  if (request.after) {
+      request.frame - static_cast<std::int64_t>(renders ? range_.first : 0);
+  host::Effect* const effect = drawn.effect;
+  if (renders) {
     ++users_;
-    if (!idle_.empty()) {
-      renderer = std::move(idle_.back());
-      idle_.pop_back();
+    if (!drawn.idle.empty()) {
+      renderer = std::move(drawn.idle.back());
+      drawn.idle.pop_back();
     }
   }
   lock.unlock();
   std::string jpeg, text;
   try {
-    if (request.after && !renderer) renderer = drawn->MakeRenderer();
+    if (renders && !renderer) renderer = effect->MakeRenderer();
     jpeg = artist.Draw(request, source.get(), renderer.get(), frame_of_shot, whole);
   } catch (const std::exception& error) {
     why = NoFrame::gone;
     text = error.what();
   }
-  if (request.after) {
+  if (renders) {
     lock.lock();
-    if (drawn_) idle_.push_back(std::move(renderer));
+    if (drawn.effect) drawn.idle.push_back(std::move(renderer));
     lock.unlock();
     renderer.reset();  // while the effect still stands
     lock.lock();

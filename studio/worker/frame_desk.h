@@ -20,15 +20,17 @@ namespace calmframe::studio {
 struct FrameRequest {
   std::int64_t frame = 0;              // of the whole clip
   bool before = false, after = false;  // both: below each other
+  bool tracks = false;                 // in place of them: before, with its tracks
   int width = 0;                       // square pixels of each
 };
 
 // Why there is none.
 enum class NoFrame {
   none,
-  busy,  // the clip is being worked
-  shot,  // another shot of it is open
-  gone   // it can't be made; the text tells why
+  busy,    // the clip is being worked
+  shot,    // another shot of it is open
+  tracks,  // nobody has shown them yet
+  gone     // it can't be made; the text tells why
 };
 
 // Draws frames on threads of its own, before and after, as JPEGs. A clip's owner tells what there
@@ -48,6 +50,8 @@ class FrameDesk {
   void SetSource(host::SourcePtr source, const media::ClipInfo& whole);
   // From now on the shot is drawn, as it stands, until Hide returns.
   void Show(host::SteadyClip& shot);
+  // The same for tracks; what is shown besides stays.
+  void ShowTracks(host::Effect& effect);
   // Waits for what is being drawn.
   void Hide();
 
@@ -73,10 +77,14 @@ class FrameDesk {
   std::deque<Asked> asked_;
   host::SourcePtr source_;
   media::ClipInfo whole_;
-  host::Effect* drawn_ = nullptr;  // null: nothing is to be drawn
+  // What draws one side of a picture.
+  struct Drawn {
+    host::Effect* effect = nullptr;  // null: nothing is to be drawn
+    std::vector<std::unique_ptr<host::Renderer>> idle;
+  };
+  Drawn steady_, tracks_;
   media::FrameRange range_;
   int users_ = 0;  // threads that draw
-  std::vector<std::unique_ptr<host::Renderer>> idle_;
   std::vector<std::thread> threads_;
 };
 

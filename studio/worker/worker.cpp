@@ -4,6 +4,8 @@
 #include <memory>
 #include <stdexcept>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "studio/worker/channel.h"
 #include "studio/worker/clip_desk.h"
@@ -19,6 +21,8 @@ const char* NameOf(NoFrame why) {
       return "busy";
     case NoFrame::shot:
       return "shot";
+    case NoFrame::tracks:
+      return "tracks";
     default:
       return "gone";
   }
@@ -57,6 +61,8 @@ class Worker {
       Answer(id, {{"shots", desk_.Curves()}});
     } else if (op == "frame") {
       AskFrame(id, head);
+    } else if (op == "lasso") {
+      Answer(id, TracksOf(head));
     } else if (op == "forget") {
       desk_.frames().Forget(head.value("of", std::uint64_t{0}));
     } else if (op == "look") {
@@ -73,16 +79,33 @@ class Worker {
   }
   void Answer(std::uint64_t id, nlohmann::json head) { AnswerBy(channel_, id, std::move(head)); }
 
+  nlohmann::json TracksOf(const nlohmann::json& head) {
+    Lasso lasso;
+    lasso.frame = head.value("frame", std::int64_t{0});
+    lasso.any_frame = head.value("any_frame", false);
+    for (const auto& [x, y] : head.value("corners", std::vector<std::pair<double, double>>())) {
+      lasso.corners.push_back({x, y});
+    }
+    nlohmann::json tracks = nlohmann::json::array(), places = nlohmann::json::array();
+    for (const LassoedTrack& track : desk_.TracksIn(lasso)) {
+      tracks.push_back({track.point.frame, track.point.slot});
+      places.push_back({track.place.x, track.place.y});
+    }
+    return {{"tracks", std::move(tracks)}, {"places", std::move(places)}};
+  }
+
   void AskFrame(std::uint64_t id, const nlohmann::json& head) {
     const FrameRequest request{.frame = head.value("frame", std::int64_t{0}),
                                .before = head.value("before", false),
                                .after = head.value("after", false),
+                               .tracks = head.value("tracks", false),
                                .width = head.value("width", 640)};
     desk_.frames().Ask(
         id, request,
         [&channel = channel_, &desk = desk_, id, frame = request.frame](
             std::string jpeg, NoFrame why, const std::string& text) {
           if (why == NoFrame::shot) desk.LookAt(frame);
+          if (why == NoFrame::tracks) desk.ShowTracks();
           AnswerBy(channel, id, {{"why", NameOf(why)}, {"error", text}}, std::move(jpeg));
         });
   }

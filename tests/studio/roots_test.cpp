@@ -46,6 +46,26 @@ TEST_F(StudioRootsTest, NothingOutsideIsFoundOrWritten) {
   EXPECT_THROW(roots.Existing("open/walk.MP4"), PathRefused);
 }
 
+TEST_F(StudioRootsTest, ANameIsFoundWhereItStandsOnceAndPicturesByTheirFolder) {
+  const Roots both({At("open"), At("open-beside")});
+  EXPECT_EQ(both.Find("work.calm"), At("open/inner/work.calm"));
+  EXPECT_EQ(both.Find("walk.mp4"), At("open-beside/walk.mp4"));
+  // Outside, in a folder that a link leads to, hidden, a link that leads out, no file, no name.
+  for (const char* name :
+       {"secret.mp4", "out.mp4", ".hidden.mp4", "inner", "", "inner/work.calm"}) {
+    EXPECT_THROW(both.Find(name), PathRefused) << name;
+  }
+  std::ofstream(place_ / "open/inner/walk.mp4") << "x";
+  EXPECT_THROW(both.Find("walk.mp4"), PathRefused) << "which of them?";
+  for (const char* folder : {"open/inner", "closed"}) {
+    std::ofstream(place_ / folder / "f0001.png") << "x";
+  }
+  EXPECT_EQ(both.ExistingClip(At("open/within/f%04d.png")), At("open/inner/f%04d.png"));
+  for (const char* path : {"closed/f%04d.png", "open/out/f%04d.png", "open/none/f%04d.png"}) {
+    EXPECT_THROW(both.ExistingClip(At(path)), PathRefused) << path;
+  }
+}
+
 TEST_F(StudioRootsTest, WhatIsWrittenLiesInAFolderThatIsThere) {
   const Roots roots({At("open")});
   EXPECT_EQ(roots.ToWrite(At("open/within/new.mp4")), At("open/inner/new.mp4"));

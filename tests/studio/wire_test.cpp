@@ -37,7 +37,8 @@ TEST(StudioWireTest, RefusesWhatIsNoMessageBeforeItIsThere) {
 TEST(StudioWireTest, SettingsSurviveTheWayThereAndBack) {
   const nlohmann::json given = nlohmann::json::parse(
       R"({"controls": {"20": 80.5, "28": 2.0},
-          "window": {"kind": "follow", "most_zoom": 1.2, "zoom_speed": 0.0, "still": "subject", "as_set": true}})");
+          "window": {"kind": "follow", "most_zoom": 1.2, "zoom_speed": 0.0, "still": "subject", "as_set": true},
+          "deleted": [[3, 7], [12, 0]]})");
   EXPECT_EQ(JsonOf(SettingsOf(given)), given);
   const nlohmann::json none = {{"controls", nlohmann::json::object()},
                                {"window", nlohmann::json::object()}};
@@ -49,7 +50,9 @@ TEST(StudioWireTest, RefusesSettingsThatNobodyCanHaveMade) {
        {"[]", R"({"controls": []})", R"({"controls": {"x": 1}})", R"({"controls": {"20x": 1}})",
         R"({"controls": {"20": "1"}})", R"({"controls": {"20": 1e300}})",
         R"({"controls": {"99999999999": 1}})", R"({"window": {"kind": "none"}})",
-        R"({"window": {"most_zoom": 0}})", R"({"window": {"zoom_speed": -1}})"}) {
+        R"({"window": {"most_zoom": 0}})", R"({"window": {"zoom_speed": -1}})",
+        R"({"deleted": {}})", R"({"deleted": [[1]]})", R"({"deleted": [[1, -1]]})",
+        R"({"deleted": [[1e10, 1]]})"}) {
     EXPECT_THROW(SettingsOf(nlohmann::json::parse(text)), std::invalid_argument) << text;
   }
 }

@@ -3,10 +3,14 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cstdint>
+#include <cstdlib>
 #include <nlohmann/json.hpp>
+#include <set>
 #include <string>
 #include <vector>
 
+#include "host/stabilize/drawing.h"
 #include "host/stabilize/failures.h"
 #include "host/stabilize/film.h"
 #include "platform/hx/hx_controls.h"
@@ -36,6 +40,18 @@ class Onlooker final : public Watcher {
 
 double MostZoom(const ShownPath& path) {
   return *std::max_element(path.output.zooms.begin(), path.output.zooms.end());
+}
+
+// Mean over all bytes.
+double DifferenceOf(const WorldBuffer& one, const WorldBuffer& other) {
+  double sum = 0;
+  const int bytes = 4 * one.world().width;
+  for (int y = 0; y < one.world().height; ++y) {
+    for (int i = 0; i < bytes; ++i) {
+      sum += std::abs(one.row<std::uint8_t>(y)[i] - other.row<std::uint8_t>(y)[i]);
+    }
+  }
+  return sum / bytes / one.world().height;
 }
 
 class SteadyClipTest : public testing::Test {
@@ -134,6 +150,83 @@ TEST_F(SteadyClipTest, AChoiceIsMadeOnceAndGoesWithTheControlsItWasMadeFor) {
   for (const Candidate& candidate : clip.choice()->candidates) {
     EXPECT_EQ(candidate.changes.count(HX_METHOD.disk_id), 0u) << "set is set: " << candidate.name;
   }
+}
+
+TEST_F(SteadyClipTest, WhatWasFoundBeforeGivesTheSame) {
+  Onlooker onlooker;
+  const auto follow = [&](SteadyClip& clip, const ParamValues& values) {
+    clip.SetControls(values);
+    clip.Work(onlooker);
+    clip.FollowPicture({.may_choose = false}, onlooker);
+  };
+  const auto draw = [](SteadyClip& clip) {
+    const auto renderer = clip.drawn().MakeRenderer();
+    return DrawFrame(*renderer, 12, 8, media::FieldOrder::progressive).pixels;
+  };
+  Film film(CALMFRAME_PLUGIN, path_);
+  SteadyClip& kept = *film.Next();
+  kept.KeepWhatIsFound();
+  follow(kept, {});
+  film.Keep();
+  const Project saved = film.Saved();
+  for (const ParamValues& values :
+       {ParamValues{{HX_ADDITIONAL_SCALE.disk_id, 130}},
+        ParamValues{{HX_MAXIMUM_SCALE.disk_id, 110}}, ParamValues{{HX_SMOOTHNESS.disk_id, 10}},
+        ParamValues{{HX_FRAMING.disk_id, 4}},
+        ParamValues{{HX_SYNTHESIS_EDGE_FEATHER.disk_id, 30}}}) {
+    const auto before = draw(kept);
+    const bool previews = kept.Preview(values);
+    const auto preview = draw(kept);
+    follow(kept, values);
+    Film anew(CALMFRAME_PLUGIN, saved, path_);
+    SteadyClip& fresh = *anew.Next();
+    fresh.SetControls(kept.Saved().effect.values);
+    follow(fresh, {});
+    const std::int32_t id = values.begin()->first;
+    EXPECT_EQ(kept.choice()->Json(), fresh.choice()->Json()) << id;
+    const auto after = draw(kept);
+    EXPECT_EQ(DifferenceOf(*after, *draw(fresh)), 0) << id;
+    EXPECT_EQ(previews,
+              id == HX_ADDITIONAL_SCALE.disk_id || id == HX_SYNTHESIS_EDGE_FEATHER.disk_id);
+    if (!previews) {
+      EXPECT_EQ(DifferenceOf(*before, *preview), 0) << id;
+    }
+    if (id == HX_ADDITIONAL_SCALE.disk_id) {
+      EXPECT_LT(DifferenceOf(*after, *preview), DifferenceOf(*after, *before) / 10);
+    }
+  }
+}
+
+TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayOutUntilTheyAreBack) {
+  Onlooker onlooker;
+  const auto count = [](const SolvedClip& clip) {
+    return std::count_if(clip.statuses.begin(), clip.statuses.end(),
+                         [](std::int32_t status) { return status > 0; });
+  };
+  Film film(CALMFRAME_PLUGIN, path_);
+  SteadyClip& clip = *film.Next();
+  clip.Work(onlooker);
+  const SolvedClip all = clip.Solved();
+  std::set<TrackPoint> some;
+  for (std::int32_t slot = 0; slot < all.slots && some.size() < 5; ++slot) {
+    if (all.statuses[static_cast<std::size_t>(slot)] > 0) some.insert({0, slot});
+  }
+  ASSERT_EQ(some.size(), 5u);
+  clip.DeleteTracks(some);
+  EXPECT_EQ(clip.Work(onlooker).Text(), "reused the analysis");
+  EXPECT_EQ(count(clip.Solved()), count(all) - 5);
+  clip.HoldStill(Still::all, onlooker);
+  EXPECT_EQ(count(clip.Solved()), count(all) - 5) << "no group is left out, and these are";
+  film.Keep();
+  const Project saved = film.Saved();
+  Film later(CALMFRAME_PLUGIN, saved, path_);
+  SteadyClip& again = *later.Next();
+  EXPECT_EQ(again.DeletedTracks(), some);
+  again.DeleteTracks(some);
+  EXPECT_TRUE(again.Work(onlooker).solve);
+  again.DeleteTracks({});
+  again.Work(onlooker);
+  EXPECT_EQ(again.Solved().vertices, all.vertices);
 }
 
 TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {
