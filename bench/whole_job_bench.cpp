@@ -208,7 +208,7 @@ void FromBesideVidstab(benchmark::State& state, const std::string& extension, co
     make.push_back(clip);
     RunProcess(make);
   }
-  Beside(state, 0.5, clip, {"-", "--as-set"}, Vidstab);
+  Beside(state, 0.75, clip, {"-", "--as-set"}, Vidstab);
 }
 
 // Two decodes and an encode, the least that a job of two passes can do.
@@ -219,7 +219,7 @@ double DecodeTwiceAndEncode(const std::string& clip) {
 }
 
 void EncodedBesideTwoDecodesAndAnEncode(benchmark::State& state) {
-  Beside(state, 2, ClipOf(state), {Folder() / "steady.mp4", "--as-set", "--overwrite"},
+  Beside(state, 1.1, ClipOf(state), {Folder() / "steady.mp4", "--as-set", "--overwrite"},
          DecodeTwiceAndEncode);
 }
 
