@@ -43,15 +43,24 @@ void Sweep(const std::filesystem::path& folder) {
   }
 }
 
-// The part's descriptor where nobody has swept it between its making and its locking; else -1.
-int Locked(int part) {
+// The part's descriptor where nobody has swept it between its making and its locking; else -1, and
+// EEXIST: another name, then.
+int Locked(int part, const std::string& path) {
   if (part < 0) return -1;
   struct stat status;
   while (flock(part, LOCK_EX) != 0 && errno == EINTR) {  // other errors: without locks no sweep
   }
-  if (fstat(part, &status) == 0 && status.st_nlink > 0) return part;
+  int error = 0;
+  if (fstat(part, &status) != 0) {
+    error = errno;
+    std::error_code ignored;
+    std::filesystem::remove(path, ignored);
+  } else if (status.st_nlink == 0) {
+    error = EEXIST;
+  }
+  if (error == 0) return part;
   close(part);
-  errno = EEXIST;  // another name, then
+  errno = error;
   return -1;
 }
 
@@ -109,6 +118,36 @@ void GiveName(const std::string& part, const std::string& path, bool overwrite,
 
 }  // namespace
 
+bool Synced(const std::string& path) {
+  const int file = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (file < 0) return false;
+  int flushed = 0;
+  while ((flushed = fsync(file)) != 0 && errno == EINTR) {
+  }
+  const int error = errno;
+  close(file);
+  errno = error;
+  return flushed == 0;
+}
+
+void SyncFolderOf(const std::string& path) {
+  const std::string folder = std::filesystem::path(path).parent_path().string();
+  Synced(folder.empty() ? "." : folder);
+}
+
+void MakeFolders(const std::string& path) {
+  std::vector<std::filesystem::path> missing;
+  for (std::filesystem::path one = path; !one.empty() && !std::filesystem::exists(one);
+       one = one.parent_path()) {
+    missing.push_back(one);
+  }
+  std::filesystem::create_directories(path);
+  while (!missing.empty()) {
+    SyncFolderOf(missing.back().string());
+    missing.pop_back();
+  }
+}
+
 OutputPart::OutputPart(const std::string& folder, bool is_folder, const std::string& shown) {
   static std::atomic<unsigned> serial = 0;
   const std::filesystem::path place(folder);
@@ -118,7 +157,7 @@ OutputPart::OutputPart(const std::string& folder, bool is_folder, const std::str
     path_ =
         (place / (kPrefix + std::to_string(getpid()) + "-" + std::to_string(serial++) + kSuffix))
             .string();
-    lock_ = Locked(Made(path_, is_folder));
+    lock_ = Locked(Made(path_, is_folder), path_);
   } while (lock_ < 0 && errno == EEXIST);
   if (lock_ < 0) {
     FailToWrite(shown,
@@ -140,12 +179,11 @@ OutputFile::OutputFile(const std::string& path, const std::string& source, bool 
       part_(std::filesystem::path(path_).parent_path().string(), false, path) {}
 
 void OutputFile::Commit() {
-  const int file = open(temporary().c_str(), O_RDONLY | O_CLOEXEC);
-  const bool flushed = file >= 0 && fsync(file) == 0;
-  const int error = errno;
-  if (file >= 0) close(file);
-  if (!flushed) FailToWrite(shown_, std::string("can't be written: ") + std::strerror(error));
+  if (!Synced(temporary())) {
+    FailToWrite(shown_, std::string("can't be written: ") + std::strerror(errno));
+  }
   GiveName(temporary(), path_, overwrite_, shown_);
+  SyncFolderOf(path_);
 }
 
 OutputPictures::OutputPictures(const NumberedPath& paths, const std::vector<std::string>& sources,
@@ -183,6 +221,8 @@ void OutputPictures::Commit() {
   for (int i = 1; i <= count_; ++i) {
     GiveName(written.At(i), paths_.At(i), overwrite_, paths_.At(i));
   }
+  SyncFolderOf(paths_.At(1));
+  if (made_folder_) SyncFolderOf(std::filesystem::path(paths_.At(1)).parent_path().string());
 }
 
 }  // namespace calmframe::media
