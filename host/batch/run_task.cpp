@@ -16,6 +16,7 @@
 
 #include "host/batch/child.h"
 #include "host/media/clip.h"
+#include "host/media/output_file.h"
 #include "host/project/project_file.h"
 #include "host/timeline/source.h"
 
@@ -195,9 +196,11 @@ class Run {
   }
 
   void MakeFolder() const {
-    std::error_code error;
-    fs::create_directories(fs::path(plan_.OutputOf(task_)).parent_path(), error);
-    if (error) throw Failed{ShownOutput() + ": " + error.message(), kOutputCode};
+    try {
+      media::MakeFolders(fs::path(plan_.OutputOf(task_)).parent_path().string());
+    } catch (const std::system_error& error) {
+      throw Failed{ShownOutput() + ": " + error.code().message(), kOutputCode};
+    }
   }
 
   void Program(const std::vector<std::string>& words) {
@@ -284,8 +287,11 @@ class Run {
     record.state = Record::State::done;
     Save();
     // Linking fails where renaming would replace what came up meanwhile.
-    if (!replaces && link(written_.c_str(), output.c_str()) == 0) return;
-    if ((replaces || errno != EEXIST) && std::rename(written_.c_str(), output.c_str()) == 0) return;
+    if ((!replaces && link(written_.c_str(), output.c_str()) == 0) ||
+        ((replaces || errno != EEXIST) && std::rename(written_.c_str(), output.c_str()) == 0)) {
+      media::SyncFolderOf(output);
+      return;
+    }
     const int error = errno;
     record.output_identity = earlier;
     throw Failed{error == EEXIST ? ShownOutput() + ": exists already (--overwrite replaces it)"
@@ -350,9 +356,10 @@ TaskResult RunTask(const Plan& plan, const Task& task, int threads, TaskWatcher&
   if (!task.refused.empty()) return FailedTask(record, {task.refused, task.refused_code});
   const TaskFolder folder = plan.FolderOf(task);
   try {
-    fs::create_directories(folder.path());
+    media::MakeFolders(folder.path());
     const FileLock lock(folder.lock());
     if (!lock.is_held()) return {TaskResult::State::busy, {}};
+    SweepParts(folder.path());
     return RunLocked(plan, task, threads, watcher, lock.descriptor());
   } catch (const std::system_error& error) {
     return FailedTask(record, {Shown(folder.path()) + ": " + error.code().message(), kOutputCode});
