@@ -81,11 +81,11 @@ class Run {
         watcher_(watcher),
         lock_(lock),
         folder_(plan.FolderOf(task)),
-        written_(folder_.output(fs::path(task.output).extension())) {}
+        written_(folder_.output(fs::path(task.output).extension())),
+        progress_(folder_.progress()) {}
   ~Run() {
-    std::error_code ignored;
-    fs::remove(written_, ignored);
-    fs::remove(folder_.progress(), ignored);
+    unlink(written_.c_str());
+    unlink(progress_.c_str());
   }
   Run(const Run&) = delete;
   Run& operator=(const Run&) = delete;
@@ -276,7 +276,7 @@ class Run {
     gethostname(machine, sizeof machine - 1);
     const nlohmann::ordered_json json = {
         {"share", share_}, {"stage", stage}, {"machine", machine}, {"pid", getpid()}};
-    WriteWhole(folder_.progress(), json.dump() + "\n");
+    WriteWhole(progress_, json.dump() + "\n");
   }
 
   // The record comes first: an output that got its name has one, whatever ends this program.
@@ -307,7 +307,7 @@ class Run {
   TaskWatcher& watcher_;
   const int lock_;
   const TaskFolder folder_;
-  const std::string written_;
+  const std::string written_, progress_;
   std::string error_;
   int error_code_ = 0;
   std::string pictures_;  // of a frame before and after, as the program told them

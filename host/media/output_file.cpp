@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <new>
 #include <set>
 #include <system_error>
 #include <utility>
@@ -167,8 +168,13 @@ OutputPart::OutputPart(const std::string& folder, bool is_folder, const std::str
 }
 
 OutputPart::~OutputPart() {
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
+  if (unlink(path_.c_str()) != 0 && errno != ENOENT) {
+    try {
+      std::error_code ignored;
+      std::filesystem::remove_all(path_, ignored);
+    } catch (const std::bad_alloc&) {  // the next output in the folder sweeps it
+    }
+  }
   close(lock_);
 }
 

@@ -14,6 +14,7 @@
 
 #include "platform/tessel/shutdown.h"
 #include "platform/tessel/threads_internal.h"
+#include "platform/tessel/undying.h"
 
 namespace tessel::threads {
 namespace {
@@ -140,8 +141,8 @@ class LiveThreads {
 };
 
 LiveThreads& live_threads() {
-  static LiveThreads& threads = *new LiveThreads;  // outlives its threads
-  return threads;
+  static utility::Undying<LiveThreads> threads;  // outlives its threads
+  return *threads;
 }
 
 // The pool's threads are told to leave when the last thread that used it ends, and nobody waits for
@@ -183,8 +184,8 @@ Executor& GetCPUBoundExecutor() {
 }
 
 void Shutdown() {
-  static std::mutex& one_at_a_time = *new std::mutex;
-  std::lock_guard<std::mutex> lock(one_at_a_time);
+  static utility::Undying<std::mutex> one_at_a_time;
+  std::lock_guard<std::mutex> lock(*one_at_a_time);
   internal::BeginEndingPooledThreads();
   live_threads().WaitForNone();
   internal::FinishEndingPooledThreads();
