@@ -22,6 +22,13 @@ def make_clip(path, seed, size="96x64", frames=12):
                     "-fflags", "+bitexact", path], check=True)
 
 
+def grey(path):
+    """The frames of a clip, a byte a pixel; empty where it doesn't decode."""
+    shown = subprocess.run(["ffmpeg", "-v", "error", "-xerror", "-nostdin", "-i", path, "-map", "0:v", "-f", "rawvideo", "-pix_fmt",
+                            "gray", "-"], stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, check=False)
+    return shown.stdout if shown.returncode == 0 else b""
+
+
 class Ended:
     def __init__(self, code, said, seconds):
         self.code, self.said, self.seconds = code, said, seconds
@@ -103,12 +110,13 @@ def how(code):
 
 def rows_of(path, masks=True):
     """All rows of a project, as they are after what SQLite does with a transaction that was cut; a text where it is none. The
-    results name the moment that they were made, so two runs differ there: with `masks` they and the sum of all are left out."""
+    results name the moment that they were made, and a number of the effect's counts what it told its host, so two runs differ there: with
+    `masks` these and the sum of all are left out."""
     try:
         database = sqlite3.connect(path)
         try:
             rows = "\n".join(database.iterdump())
-            return re.sub(r"X'[0-9A-F]+'|'checksum','[^']*'", "-", rows) if masks else rows
+            return re.sub(r"X'[0-9A-F]+'|'checksum','[^']*'|\(1,302,[0-9.]+\)", "-", rows) if masks else rows
         finally:
             database.close()
     except sqlite3.Error as error:
