@@ -56,11 +56,9 @@ bool WriteWhole(const std::string& path, const std::string& text) {
 }
 
 void SweepParts(const std::string& folder) {
-  std::error_code error;
-  for (std::filesystem::directory_iterator entry(folder, error), end; !error && entry != end;
-       entry.increment(error)) {
+  for (const std::string& name : media::NamesIn(folder)) {
     std::error_code ignored;
-    if (entry->path().extension() == kPartSuffix) std::filesystem::remove_all(*entry, ignored);
+    if (name.ends_with(kPartSuffix)) std::filesystem::remove_all(folder + "/" + name, ignored);
   }
 }
 

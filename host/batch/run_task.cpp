@@ -9,6 +9,7 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <new>
 #include <nlohmann/json.hpp>
 #include <set>
 #include <system_error>
@@ -363,6 +364,8 @@ TaskResult RunTask(const Plan& plan, const Task& task, int threads, TaskWatcher&
     return RunLocked(plan, task, threads, watcher, lock.descriptor());
   } catch (const std::system_error& error) {
     return FailedTask(record, {Shown(folder.path()) + ": " + error.code().message(), kOutputCode});
+  } catch (const std::bad_alloc&) {
+    return FailedTask(record, {"out of memory", kWorkCode});
   }
 }
 

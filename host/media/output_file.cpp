@@ -1,5 +1,6 @@
 #include "host/media/output_file.h"
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -10,6 +11,7 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <memory>
 #include <new>
 #include <set>
 #include <system_error>
@@ -31,15 +33,13 @@ constexpr char kSuffix[] = ".part";
 // What a program that was killed has left in the folder: who writes holds a lock on its part, which
 // ends with it.
 void Sweep(const std::filesystem::path& folder) {
-  std::error_code error;
-  for (std::filesystem::directory_iterator entry(folder.empty() ? "." : folder, error), end;
-       !error && entry != end; entry.increment(error)) {
-    const std::string name = entry->path().filename().string();
+  for (const std::string& name : NamesIn(folder.string())) {
     if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix)) continue;
-    const int part = open(entry->path().c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+    const std::filesystem::path path = folder / name;
+    const int part = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
     if (part < 0) continue;
     std::error_code ignored;
-    if (flock(part, LOCK_EX | LOCK_NB) == 0) std::filesystem::remove_all(entry->path(), ignored);
+    if (flock(part, LOCK_EX | LOCK_NB) == 0) std::filesystem::remove_all(path, ignored);
     close(part);
   }
 }
@@ -118,6 +118,16 @@ void GiveName(const std::string& part, const std::string& path, bool overwrite,
 }
 
 }  // namespace
+
+std::vector<std::string> NamesIn(const std::string& folder) {
+  const std::unique_ptr<DIR, int (*)(DIR*)> open(opendir(folder.empty() ? "." : folder.c_str()),
+                                                 closedir);
+  std::vector<std::string> names;
+  while (const dirent* entry = open ? readdir(open.get()) : nullptr) {
+    names.emplace_back(entry->d_name);
+  }
+  return names;
+}
 
 bool Synced(const std::string& path) {
   const int file = open(path.c_str(), O_RDONLY | O_CLOEXEC);

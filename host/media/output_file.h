@@ -16,6 +16,10 @@ bool Synced(const std::string& path);
 // folder, and the file is whole under either name, so that nothing is told.
 void SyncFolderOf(const std::string& path);
 
+// What a folder has, "." and ".." too; nothing where it can't be read. The standard library's own
+// way there ends the process where it finds no memory. Empty is the present folder.
+std::vector<std::string> NamesIn(const std::string& folder);
+
 // Makes a folder with those above it that are missing; they last. Throws std::system_error.
 void MakeFolders(const std::string& path);
 
