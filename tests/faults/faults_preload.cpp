@@ -11,7 +11,8 @@
 //                   half way through it
 //                 record: FAULTS_OUT gets each change of FAULTS_ROOT: a line "operation inode
 //                   offset bytes length-of-path length-of-second-path", then paths and bytes
-// What a library calls within itself is not seen.
+// What a library calls within itself is not seen, nor what is called before main: nothing can be
+// done about that, as no exception can be caught there.
 
 #include <dirent.h>
 #include <dlfcn.h>
@@ -64,6 +65,8 @@ struct Site {
   char file[kLongestName];
 };
 constexpr std::size_t kSites = 1 << 16;
+
+std::atomic<bool> is_in_main = false;
 
 // Constant once `mode` is beyond `starting`.
 std::atomic<Mode> mode = Mode::unknown;
@@ -173,6 +176,7 @@ extern "C" __attribute__((noinline, visibility("default"))) void faults_placed()
 
 // Whether this call is to fail; errno says how.
 bool Fails(const char* function, const void* caller) {
+  if (!is_in_main) return false;
   const Mode now = Now();
   if (now == Mode::sites) Count(function, caller);
   if (now != Mode::fail) return false;
@@ -376,7 +380,21 @@ void* Block(void* block) {
 #define FAIL(name, answer) \
   if (Fails(#name, CALLER)) return answer
 
-// ---- For the program itself, which looks them up.
+using Main = int (*)(int, char**, char**);
+static Main program_main = nullptr;
+static int MainOfProgram(int count, char** words, char** environment) {
+  is_in_main = true;
+  return program_main(count, words, environment);
+}
+extern "C" int __libc_start_main(Main main, int count, char** words, void (*init)(), void (*fini)(),
+                                 void (*loader_fini)(), void* stack_end) {
+  program_main = main;
+  const auto next =
+      reinterpret_cast<decltype(&__libc_start_main)>(dlsym(RTLD_NEXT, "__libc_start_main"));
+  return next(MainOfProgram, count, words, init, fini, loader_fini, stack_end);
+}
+
+// ---- For the program itself, which looks it up.
 
 extern "C" __attribute__((visibility("default"))) void faults_disarm() {
   if (Now() == Mode::fail) state->disarmed = 1;

@@ -22,6 +22,14 @@ def make_clip(path, seed, size="96x64", frames=12):
                     "-fflags", "+bitexact", path], check=True)
 
 
+def function_at(path, offset):
+    """Whose code that is, as the file's symbols tell; empty where they don't, or nothing reads them."""
+    try:
+        return subprocess.run(["addr2line", "-Cf", "-e", path, hex(int(offset, 16) - 1)], stdout=subprocess.PIPE, check=False).stdout.decode()
+    except FileNotFoundError:
+        return ""
+
+
 def grey(path):
     """The frames of a clip, a byte a pixel; empty where it doesn't decode."""
     shown = subprocess.run(["ffmpeg", "-v", "error", "-xerror", "-nostdin", "-i", path, "-map", "0:v", "-f", "rawvideo", "-pix_fmt",
