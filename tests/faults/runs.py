@@ -18,14 +18,16 @@ def make_clip(path, seed, size="96x64", frames=12):
     """Frames that shake, with sound."""
     subprocess.run(["ffmpeg", "-v", "error", "-nostdin", "-y", "-f", "lavfi", "-i",
                     f"testsrc2=s={size}:r=25,rotate=0.05*sin(n/2+{seed}):fillcolor=gray", "-f", "lavfi", "-i", f"sine={440 + seed}",
-                    "-frames:v", str(frames), "-t", str(frames / 25), "-c:v", "libx264", "-preset", "ultrafast", "-pix_fmt", "yuv420p", "-c:a", "aac",
+                    "-frames:v", str(frames), "-t", str(frames / 25), "-c:v", "libx264", "-preset", "ultrafast", "-pix_fmt", "yuv420p",
+                    "-c:a", "aac",
                     "-fflags", "+bitexact", path], check=True)
 
 
 def function_at(path, offset):
     """Whose code that is, as the file's symbols tell; empty where they don't, or nothing reads them."""
     try:
-        return subprocess.run(["addr2line", "-Cf", "-e", path, hex(int(offset, 16) - 1)], stdout=subprocess.PIPE, check=False).stdout.decode()
+        words = ["addr2line", "-Cf", "-e", path, hex(int(offset, 16) - 1)]
+        return subprocess.run(words, stdout=subprocess.PIPE, check=False).stdout.decode()
     except FileNotFoundError:
         return ""
 
@@ -177,7 +179,7 @@ SAME_BITS = ["--preset", "ultrafast"]
 
 
 def commands(program, library_calls):
-    """Name: what was there before (commands), the command, whether its second run does the same again."""
+    """Name: the commands before, the command."""
     def stabilize(out, *flags):
         return [program, "stabilize", "a.mp4", out, "--project", PROJECT, "--quiet", "--threads", "2", *SAME_BITS, *flags]
     def analyze(*flags):
@@ -187,7 +189,8 @@ def commands(program, library_calls):
         "stabilize": ([], stabilize("out.mp4")),
         # Over a project and an output of other controls.
         "save-over": ([stabilize("out.mp4")], stabilize("out.mp4", "--smoothness", "90", "--overwrite")),
-        "render": ([analyze("--choose")], [program, "render", "--project", PROJECT, "out.mp4", "--quiet", "--threads", "2", "--overwrite", *SAME_BITS]),
+        "render": ([analyze("--choose")],
+                   [program, "render", "--project", PROJECT, "out.mp4", "--quiet", "--threads", "2", "--overwrite", *SAME_BITS]),
         "load": ([analyze()], [program, "info", PROJECT]),
         "tracks": ([analyze()], [program, "tracks", PROJECT, "out.trk", "--overwrite"]),
         "report": ([analyze("--choose")], [program, "report", PROJECT, "out.html", "--overwrite", "--quiet"]),
