@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "apps/calmframe/batch_results.h"
+#include "apps/calmframe/confinement.h"
 #include "apps/calmframe/exit_codes.h"
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/film_work.h"
@@ -273,6 +274,7 @@ BatchShotsCommand::BatchShotsCommand(CLI::App& program)
 }
 
 void BatchShotsCommand::Run() {
+  Confinement{.read = {input_}, .written = {output_}}.Begin();
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
   RunOnPromises([&](host::Opening opening) { Find(opening, progress); });
@@ -323,6 +325,7 @@ BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)
 }
 
 void BatchPicturesCommand::Run() {
+  Confinement{.read = {before_, after_}}.Begin();
   const ThumbnailSource before(before_), after(after_);
   std::printf("%s\n", Thumbnails(before.view(), after.view()).dump().c_str());
 }

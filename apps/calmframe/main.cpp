@@ -154,7 +154,8 @@ constexpr char kFooter[] =
     "  130  interrupted\n"
     "\n"
     "Environment:\n"
-    "  CALMFRAME_PLUGIN  the plug-in to load in place of the one that came along";
+    "  CALMFRAME_PLUGIN  the plug-in to load in place of the one that came along\n"
+    "  CALMFRAME_NO_SANDBOX  not empty: as --no-sandbox for all that is run";
 
 int Run(int argc, char** argv) {
   CLI::App program(kDescription, "calmframe");

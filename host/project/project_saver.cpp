@@ -98,6 +98,7 @@ void Create(const fs::path& path, const Fill& fill) {
   temporary += ".XXXXXX";
   const int made = mkstemp(temporary.data());
   if (made < 0) Fail(path, std::strerror(errno));
+  fchmod(made, 0644);
   close(made);
   try {
     {
@@ -106,7 +107,6 @@ void Create(const fs::path& path, const Fill& fill) {
       fill(database);
       database.Run("COMMIT");
     }
-    chmod(temporary.c_str(), 0644);
     Sync(temporary);
     fs::rename(temporary, path);
     Sync(path.parent_path());

@@ -83,6 +83,8 @@ TEST_F(ProjectTest, TheClipIsFoundBesideAProjectThatMovedOrWhereItWas) {
   EXPECT_EQ(FindClip(path, project), In("moved/walk.mp4"));
   fs::rename(In("moved/walk.mp4"), In("moved/clips/walk.mp4"));
   EXPECT_EQ(FindClip(path, project), In("moved/clips/walk.mp4"));
+  const auto admits = [&](const std::string& place) { return place == In("clips/walk.mp4"); };
+  EXPECT_THAT([&] { FindClip(path, project, admits); }, IsRefused("clips/walk.mp4: is not the"));
   fs::remove(In("moved/clips/walk.mp4"));
   EXPECT_THAT([&] { FindClip(path, project); }, IsRefused("clips/walk.mp4: is not the clip"));
   fs::remove(In("clips/walk.mp4"));
