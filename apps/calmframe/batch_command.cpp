@@ -318,6 +318,19 @@ void BatchJobCommand::Run() {
   if (InterruptAsked()) throw Interrupted();
 }
 
+BatchGlancesCommand::BatchGlancesCommand(CLI::App& program)
+    : Command(*program.add_subcommand(batch::kGlancesCommand)->group("")) {
+  AddFiles(parser_, "IN", inputs_, "");
+}
+
+void BatchGlancesCommand::Run() {
+  Confinement{.read = inputs_}.Begin();
+  for (const std::string& input : inputs_) {
+    std::printf("%s\n", batch::GlanceText(input).c_str());
+    std::fflush(stdout);
+  }
+}
+
 BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)
     : Command(*program.add_subcommand("batch-pictures")->group("")) {
   AddFile(parser_, "BEFORE", before_, "");

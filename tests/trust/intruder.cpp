@@ -1,7 +1,8 @@
-// What a fault in a decoder could be made to do: preloaded, it stands in for the call that takes
-// packets from a clip, and tries one door after the other from there, on whatever thread that is.
-// Writes a line a door, "NAME open" or "NAME closed", to the file INTRUDER_REPORT; what it reaches
-// for lies in the folder INTRUDER_TARGET, and in INTRUDER_OUTPUT, where the program writes.
+// What a fault in a decoder could be made to do: preloaded, it stands in for the calls that open
+// a clip and take packets from it, and tries one door after the other from there, on whatever
+// thread that is. Writes a line a door, "NAME open" or "NAME closed", to the file INTRUDER_REPORT;
+// what it reaches for lies in the folder INTRUDER_TARGET, and in INTRUDER_OUTPUT, where the program
+// writes.
 
 #include <arpa/inet.h>
 #include <dirent.h>
@@ -104,12 +105,27 @@ void TryAll() {
   Tell("own-namespace", unshare(CLONE_NEWNS) == 0);
 }
 
-}  // namespace
-
-extern "C" int av_read_frame(void* clip, void* packet) {
+void TryOnce() {
   static std::once_flag once;
   std::call_once(once, TryAll);
-  using Real = int (*)(void*, void*);
-  static const auto real = reinterpret_cast<Real>(dlsym(RTLD_NEXT, "av_read_frame"));
+}
+
+template <class Call>
+Call* Real(const char* name) {
+  return reinterpret_cast<Call*>(dlsym(RTLD_NEXT, name));
+}
+
+}  // namespace
+
+extern "C" int avformat_open_input(void** clip, const char* name, const void* format,
+                                   void** options) {
+  TryOnce();
+  static auto* const real = Real<decltype(avformat_open_input)>("avformat_open_input");
+  return real(clip, name, format, options);
+}
+
+extern "C" int av_read_frame(void* clip, void* packet) {
+  TryOnce();
+  static auto* const real = Real<decltype(av_read_frame)>("av_read_frame");
   return real(clip, packet);
 }
