@@ -137,7 +137,7 @@ void StudioCommand::Run() {
     settings.studio.worker.insert(settings.studio.worker.end(), {kWorkerFolder, folder});
   }
   settings.studio.worker.insert(settings.studio.worker.end(),
-                                {kWorkerFolder, settings.studio.folder});
+                                {kWorkerFolder, settings.studio.WorkFolder()});
   settings.listens = [this](const std::string& address) {
     std::printf("%s\n", address.c_str());
     std::fflush(stdout);
