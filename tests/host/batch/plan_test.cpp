@@ -205,6 +205,12 @@ TEST_F(BatchPlanTest, WhatIsDoneIsDoneUntilAnythingChanges) {
   lost.replace(lost.find("done"), 4, "lost");
   ASSERT_TRUE(WriteWhole(path, lost));
   EXPECT_FALSE(ReadRecord(path)) << "of a state that there is not";
+  for (const std::size_t depth : {98, 99, 100000}) {  // in two objects
+    std::string nested = text;
+    nested.replace(nested.find("1.25"), 4, std::string(depth, '[') + std::string(depth, ']'));
+    ASSERT_TRUE(WriteWhole(path, nested));
+    EXPECT_EQ(ReadRecord(path).has_value(), depth < 99) << depth;
+  }
   SaveRecord(plan, whole);
   std::filesystem::remove(plan.OutputOf(task));
   EXPECT_FALSE(DoneRecord(plan, task));
