@@ -1,6 +1,7 @@
 // Whatever a file holds, it opens as a clip or is refused with a line, and any frame of it can be
-// asked for.
+// asked for, and written beside the clip's other streams.
 
+#include <algorithm>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -21,6 +22,8 @@ enum : std::uint8_t {
   kFound = 4,         // opened again with what was found
   kDamagedFound = 8,  // a byte of that another one
   kDeep = 16,         // read at 16 bits, else at 8
+  kWritten = 32,      // to a file, beside its other streams
+  kMovie = 64         // that is an MP4, else a Matroska file
 };
 
 // More is honest work, and the time is better spent on other files.
@@ -39,6 +42,28 @@ void ReadSome(ClipReader& clip) {
     } catch (const Failure&) {
     }
   }
+}
+
+// Of its first frames, or without the first one.
+void WriteSome(ClipReader& clip, std::uint8_t flags, const std::string& path) {
+  const ClipInfo& info = clip.info();
+  if (std::int64_t{info.width} * info.height > kMostPixels) return;
+  constexpr std::size_t kMostFrames = 8;
+  const FrameRange range{(flags & kPart) && info.frame_count > 1 ? std::size_t{1} : 0,
+                         std::min(info.frame_count, kMostFrames)};
+  const ClipInfo part = PartOf(info, range);
+  std::vector<HX_Pixel8> pixels(static_cast<std::size_t>(info.width) *
+                                static_cast<std::size_t>(info.height));
+  EncodeSettings settings;
+  settings.codec = flags & kMovie ? "mpeg4" : "ffv1";
+  settings.overwrite = true;
+  const auto writer = ClipWriter::Create(path, part, info.width, info.height, settings);
+  for (std::size_t frame = range.first; frame < range.end; ++frame) {
+    const std::ptrdiff_t row_bytes = std::ptrdiff_t{sizeof(HX_Pixel8)} * info.width;
+    clip.Read(frame, pixels.data(), row_bytes);
+    writer->Write(frame - range.first, pixels.data(), row_bytes);
+  }
+  writer->Finish();
 }
 
 }  // namespace
@@ -61,6 +86,10 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
       ReadSome<HX_Pixel16>(*clip);
     } else {
       ReadSome<HX_Pixel8>(*clip);
+    }
+    if (flags & kWritten) {
+      static const fuzz::ScratchFile written;
+      WriteSome(*clip, flags, written.path() + (flags & kMovie ? ".mp4" : ".mkv"));
     }
     if (!(flags & kFound)) return 0;
     std::vector<std::uint8_t> found = clip->found()->Bytes();
