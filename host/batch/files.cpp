@@ -11,6 +11,8 @@
 #include <nlohmann/json.hpp>
 #include <system_error>
 
+#include "host/base/json_depth.h"
+
 namespace calmframe::batch {
 
 std::optional<FileIdentity> IdentityOf(const std::string& path) {
@@ -46,6 +48,7 @@ bool WriteWhole(const std::string& path, const std::string& text) {
 std::optional<nlohmann::ordered_json> ReadObject(const std::string& path) {
   std::ifstream file(path, std::ios::binary);
   const std::string text{std::istreambuf_iterator<char>(file), {}};
+  if (NestsTooDeep(text)) return std::nullopt;
   auto object = nlohmann::ordered_json::parse(text, nullptr, false);
   if (!object.is_object()) return std::nullopt;
   return object;

@@ -14,6 +14,7 @@
 #include <system_error>
 #include <utility>
 
+#include "host/base/json_depth.h"
 #include "host/batch/child.h"
 #include "host/media/clip.h"
 #include "host/project/project_file.h"
@@ -232,6 +233,7 @@ class Run {
   }
 
   void Hear(const std::string& line) {
+    if (NestsTooDeep(line)) return;
     const auto json = nlohmann::ordered_json::parse(line, nullptr, false);
     if (!json.is_object()) return;
     try {
