@@ -26,6 +26,7 @@
 #include "host/batch/slurm_batch.h"
 #include "host/batch/split_film.h"
 #include "host/effects/host.h"
+#include "host/media/output_file.h"
 #include "platform/tessel/threads.h"
 
 namespace calmframe {
@@ -38,15 +39,15 @@ static_assert(batch::kUsageCode == kUsage && batch::kInputCode == kInput &&
 
 // The folder, which is made.
 std::string MadeFolder(const std::string& path) {
-  std::error_code error;
-  fs::create_directories(path, error);
-  const fs::path place = error ? fs::path() : fs::canonical(path, error);
-  if (error || !fs::is_directory(place)) {
-    throw media::Failure(
-        media::Failure::Side::output,
-        batch::Shown(path) + ": " + (error ? error.message() : std::string("is not a folder")));
+  std::string cause = "is not a folder";
+  try {
+    media::MakeFolders(path);
+    const fs::path place = fs::canonical(path);
+    if (fs::is_directory(place)) return place.string();
+  } catch (const std::system_error& error) {
+    cause = error.code().message();
   }
-  return place.string();
+  throw media::Failure(media::Failure::Side::output, batch::Shown(path) + ": " + cause);
 }
 
 // What is wrong with them would be wrong for each clip.

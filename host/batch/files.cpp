@@ -6,14 +6,21 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <nlohmann/json.hpp>
 #include <system_error>
 
 #include "host/base/json_depth.h"
+#include "host/media/output_file.h"
 
 namespace calmframe::batch {
+namespace {
+
+constexpr char kPartSuffix[] = ".part";
+
+}  // namespace
 
 std::optional<FileIdentity> IdentityOf(const std::string& path) {
   struct stat status;
@@ -34,20 +41,36 @@ bool WriteWhole(const std::string& path, const std::string& text) {
   // Unique for a process of any machine that shares the folder.
   char machine[65] = "";
   gethostname(machine, sizeof machine - 1);
-  const std::string part = path + "." + machine + "-" + std::to_string(getpid()) + ".part";
+  const std::string part = path + "." + machine + "-" + std::to_string(getpid()) + kPartSuffix;
   std::ofstream file(part, std::ios::binary | std::ios::trunc);
   file << text;
   file.close();
-  if (file && std::rename(part.c_str(), path.c_str()) == 0) return true;
+  // Bytes first: of a name without them the end of the machine would leave an empty file.
+  if (file && media::Synced(part) && std::rename(part.c_str(), path.c_str()) == 0) {
+    media::SyncFolderOf(path);
+    return true;
+  }
   const int error = errno;
   unlink(part.c_str());
   errno = error;
   return false;
 }
 
+void SweepParts(const std::string& folder) {
+  for (const std::string& name : media::NamesIn(folder)) {
+    std::error_code ignored;
+    if (name.ends_with(kPartSuffix)) std::filesystem::remove_all(folder + "/" + name, ignored);
+  }
+}
+
 std::optional<nlohmann::ordered_json> ReadObject(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  const std::string text{std::istreambuf_iterator<char>(file), {}};
+  std::string text;
+  try {
+    std::ifstream file(path, std::ios::binary);
+    text.assign(std::istreambuf_iterator<char>(file), {});
+  } catch (const std::ios_base::failure&) {  // of the disk, which iterators throw
+    return std::nullopt;
+  }
   if (NestsTooDeep(text)) return std::nullopt;
   auto object = nlohmann::ordered_json::parse(text, nullptr, false);
   if (!object.is_object()) return std::nullopt;

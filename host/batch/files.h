@@ -21,9 +21,12 @@ nlohmann::ordered_json JsonOf(const FileIdentity& identity);
 // Throws nlohmann::json::exception.
 FileIdentity IdentityOf(const nlohmann::ordered_json& json);
 
-// Whoever reads the file finds what stood there before or this. False, with errno, where it can't
-// be written. It is not waited for until the disk has it: after a power cut it may be empty.
+// Whoever reads the file finds what stood there before or this, also after a power cut, and this
+// once the call has ended. False, with errno, where it can't be written.
 bool WriteWhole(const std::string& path, const std::string& text);
+
+// Removes what a program that was killed was writing into a folder; for whoever holds its lock.
+void SweepParts(const std::string& folder);
 
 // The file as an object; none where it isn't there, or is anything else.
 std::optional<nlohmann::ordered_json> ReadObject(const std::string& path);

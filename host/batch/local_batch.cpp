@@ -5,6 +5,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <deque>
+#include <exception>
 #include <mutex>
 #include <numeric>
 #include <thread>
@@ -31,7 +32,7 @@ class LocalBatch {
     const auto count =
         std::min<std::size_t>(static_cast<std::size_t>(settings_.jobs), plan_.tasks.size());
     std::vector<std::jthread> workers;  // a worker's end ends its program
-    for (std::size_t w = 0; w < count; ++w) workers.emplace_back([this] { Work(); });
+    for (std::size_t w = 0; w < count; ++w) workers.emplace_back([this] { WorkOrFail(); });
     try {
       while (Tell()) {
       }
@@ -39,6 +40,8 @@ class LocalBatch {
       Stop();
       throw;
     }
+    workers.clear();
+    if (failure_) std::rethrow_exception(failure_);
   }
 
  private:
@@ -46,7 +49,7 @@ class LocalBatch {
   bool Tell() {
     std::unique_lock lock(mutex_);
     changed_.wait_for(lock, std::chrono::milliseconds(100), [this] { return !ended_.empty(); });
-    const bool over = waiting_.empty() && working_ == 0;
+    const bool over = (waiting_.empty() && working_ == 0) || failure_;
     std::deque<std::pair<std::size_t, TaskResult>> ended;
     ended.swap(ended_);
     const std::vector<double> shares(shares_.begin(), shares_.end());
@@ -90,9 +93,22 @@ class LocalBatch {
     });
   }
 
+  // What ends a worker ends all: no memory, mostly, for what a task came to.
+  void WorkOrFail() {
+    try {
+      Work();
+    } catch (...) {
+      stops_ = true;
+      const std::lock_guard lock(mutex_);
+      if (!failure_) failure_ = std::current_exception();
+      waiting_.clear();
+      changed_.notify_all();
+    }
+  }
+
   void Work() {
     std::unique_lock lock(mutex_);
-    while (!waiting_.empty() || working_ > 0) {
+    while ((!waiting_.empty() || working_ > 0) && !failure_) {
       const auto next = Fitting();
       if (next == waiting_.end()) {
         changed_.wait_for(lock, std::chrono::milliseconds(200));
@@ -133,6 +149,7 @@ class LocalBatch {
   std::size_t working_ = 0;
   std::int64_t memory_ = 0;  // that those who work are expected to take
   std::deque<std::pair<std::size_t, TaskResult>> ended_;
+  std::exception_ptr failure_;  // of the first worker that one ended
 };
 
 }  // namespace

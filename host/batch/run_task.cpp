@@ -9,6 +9,7 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <new>
 #include <nlohmann/json.hpp>
 #include <set>
 #include <system_error>
@@ -17,6 +18,7 @@
 #include "host/base/json_depth.h"
 #include "host/batch/child.h"
 #include "host/media/clip.h"
+#include "host/media/output_file.h"
 #include "host/project/project_file.h"
 #include "host/timeline/source.h"
 
@@ -81,11 +83,11 @@ class Run {
         watcher_(watcher),
         lock_(lock),
         folder_(plan.FolderOf(task)),
-        written_(folder_.output(fs::path(task.output).extension())) {}
+        written_(folder_.output(fs::path(task.output).extension())),
+        progress_(folder_.progress()) {}
   ~Run() {
-    std::error_code ignored;
-    fs::remove(written_, ignored);
-    fs::remove(folder_.progress(), ignored);
+    unlink(written_.c_str());
+    unlink(progress_.c_str());
   }
   Run(const Run&) = delete;
   Run& operator=(const Run&) = delete;
@@ -196,9 +198,11 @@ class Run {
   }
 
   void MakeFolder() const {
-    std::error_code error;
-    fs::create_directories(fs::path(plan_.OutputOf(task_)).parent_path(), error);
-    if (error) throw Failed{ShownOutput() + ": " + error.message(), kOutputCode};
+    try {
+      media::MakeFolders(fs::path(plan_.OutputOf(task_)).parent_path().string());
+    } catch (const std::system_error& error) {
+      throw Failed{ShownOutput() + ": " + error.code().message(), kOutputCode};
+    }
   }
 
   void Program(const std::vector<std::string>& words) {
@@ -275,7 +279,7 @@ class Run {
     gethostname(machine, sizeof machine - 1);
     const nlohmann::ordered_json json = {
         {"share", share_}, {"stage", stage}, {"machine", machine}, {"pid", getpid()}};
-    WriteWhole(folder_.progress(), json.dump() + "\n");
+    WriteWhole(progress_, json.dump() + "\n");
   }
 
   // The record comes first: an output that got its name has one, whatever ends this program.
@@ -286,8 +290,11 @@ class Run {
     record.state = Record::State::done;
     Save();
     // Linking fails where renaming would replace what came up meanwhile.
-    if (!replaces && link(written_.c_str(), output.c_str()) == 0) return;
-    if ((replaces || errno != EEXIST) && std::rename(written_.c_str(), output.c_str()) == 0) return;
+    if ((!replaces && link(written_.c_str(), output.c_str()) == 0) ||
+        ((replaces || errno != EEXIST) && std::rename(written_.c_str(), output.c_str()) == 0)) {
+      media::SyncFolderOf(output);
+      return;
+    }
     const int error = errno;
     record.output_identity = earlier;
     throw Failed{error == EEXIST ? ShownOutput() + ": exists already (--overwrite replaces it)"
@@ -303,7 +310,7 @@ class Run {
   TaskWatcher& watcher_;
   const int lock_;
   const TaskFolder folder_;
-  const std::string written_;
+  const std::string written_, progress_;
   std::string error_;
   int error_code_ = 0;
   std::string pictures_;  // of a frame before and after, as the program told them
@@ -352,12 +359,15 @@ TaskResult RunTask(const Plan& plan, const Task& task, int threads, TaskWatcher&
   if (!task.refused.empty()) return FailedTask(record, {task.refused, task.refused_code});
   const TaskFolder folder = plan.FolderOf(task);
   try {
-    fs::create_directories(folder.path());
+    media::MakeFolders(folder.path());
     const FileLock lock(folder.lock());
     if (!lock.is_held()) return {TaskResult::State::busy, {}};
+    SweepParts(folder.path());
     return RunLocked(plan, task, threads, watcher, lock.descriptor());
   } catch (const std::system_error& error) {
     return FailedTask(record, {Shown(folder.path()) + ": " + error.code().message(), kOutputCode});
+  } catch (const std::bad_alloc&) {
+    return FailedTask(record, {"out of memory", kWorkCode});
   }
 }
 

@@ -106,8 +106,8 @@ class FfmpegReader final : public ClipReader {
     if (!first_pass_) return;
     ahead_.reset();
     list_ = first_pass_->Complete();
+    Find();  // may fail, and is tried again by the next frame
     first_pass_.reset();
-    Find();
   }
 
   void Find() { finder_.emplace(info_.path, list_->index, !list_->info.warning.empty()); }

@@ -1,5 +1,6 @@
 #include "host/media/output_file.h"
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -10,6 +11,8 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <memory>
+#include <new>
 #include <set>
 #include <system_error>
 #include <utility>
@@ -30,28 +33,35 @@ constexpr char kSuffix[] = ".part";
 // What a program that was killed has left in the folder: who writes holds a lock on its part, which
 // ends with it.
 void Sweep(const std::filesystem::path& folder) {
-  std::error_code error;
-  for (std::filesystem::directory_iterator entry(folder.empty() ? "." : folder, error), end;
-       !error && entry != end; entry.increment(error)) {
-    const std::string name = entry->path().filename().string();
+  for (const std::string& name : NamesIn(folder.string())) {
     if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix)) continue;
-    const int part = open(entry->path().c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+    const std::filesystem::path path = folder / name;
+    const int part = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
     if (part < 0) continue;
     std::error_code ignored;
-    if (flock(part, LOCK_EX | LOCK_NB) == 0) std::filesystem::remove_all(entry->path(), ignored);
+    if (flock(part, LOCK_EX | LOCK_NB) == 0) std::filesystem::remove_all(path, ignored);
     close(part);
   }
 }
 
-// The part's descriptor where nobody has swept it between its making and its locking; else -1.
-int Locked(int part) {
+// The part's descriptor where nobody has swept it between its making and its locking; else -1, and
+// EEXIST: another name, then.
+int Locked(int part, const std::string& path) {
   if (part < 0) return -1;
   struct stat status;
   while (flock(part, LOCK_EX) != 0 && errno == EINTR) {  // other errors: without locks no sweep
   }
-  if (fstat(part, &status) == 0 && status.st_nlink > 0) return part;
+  int error = 0;
+  if (fstat(part, &status) != 0) {
+    error = errno;
+    std::error_code ignored;
+    std::filesystem::remove(path, ignored);
+  } else if (status.st_nlink == 0) {
+    error = EEXIST;
+  }
+  if (error == 0) return part;
   close(part);
-  errno = EEXIST;  // another name, then
+  errno = error;
   return -1;
 }
 
@@ -109,6 +119,46 @@ void GiveName(const std::string& part, const std::string& path, bool overwrite,
 
 }  // namespace
 
+std::vector<std::string> NamesIn(const std::string& folder) {
+  const std::unique_ptr<DIR, int (*)(DIR*)> open(opendir(folder.empty() ? "." : folder.c_str()),
+                                                 closedir);
+  std::vector<std::string> names;
+  while (const dirent* entry = open ? readdir(open.get()) : nullptr) {
+    names.emplace_back(entry->d_name);
+  }
+  return names;
+}
+
+bool Synced(const std::string& path) {
+  const int file = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (file < 0) return false;
+  int flushed = 0;
+  while ((flushed = fsync(file)) != 0 && errno == EINTR) {
+  }
+  const int error = errno;
+  close(file);
+  errno = error;
+  return flushed == 0;
+}
+
+void SyncFolderOf(const std::string& path) {
+  const std::string folder = std::filesystem::path(path).parent_path().string();
+  Synced(folder.empty() ? "." : folder);
+}
+
+void MakeFolders(const std::string& path) {
+  std::vector<std::filesystem::path> missing;
+  for (std::filesystem::path one = path; !one.empty() && !std::filesystem::exists(one);
+       one = one.parent_path()) {
+    missing.push_back(one);
+  }
+  std::filesystem::create_directories(path);
+  while (!missing.empty()) {
+    SyncFolderOf(missing.back().string());
+    missing.pop_back();
+  }
+}
+
 OutputPart::OutputPart(const std::string& folder, bool is_folder, const std::string& shown) {
   static std::atomic<unsigned> serial = 0;
   const std::filesystem::path place(folder);
@@ -118,7 +168,7 @@ OutputPart::OutputPart(const std::string& folder, bool is_folder, const std::str
     path_ =
         (place / (kPrefix + std::to_string(getpid()) + "-" + std::to_string(serial++) + kSuffix))
             .string();
-    lock_ = Locked(Made(path_, is_folder));
+    lock_ = Locked(Made(path_, is_folder), path_);
   } while (lock_ < 0 && errno == EEXIST);
   if (lock_ < 0) {
     FailToWrite(shown,
@@ -128,8 +178,13 @@ OutputPart::OutputPart(const std::string& folder, bool is_folder, const std::str
 }
 
 OutputPart::~OutputPart() {
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
+  if (unlink(path_.c_str()) != 0 && errno != ENOENT) {
+    try {
+      std::error_code ignored;
+      std::filesystem::remove_all(path_, ignored);
+    } catch (const std::bad_alloc&) {  // the next output in the folder sweeps it
+    }
+  }
   close(lock_);
 }
 
@@ -140,12 +195,11 @@ OutputFile::OutputFile(const std::string& path, const std::string& source, bool 
       part_(std::filesystem::path(path_).parent_path().string(), false, path) {}
 
 void OutputFile::Commit() {
-  const int file = open(temporary().c_str(), O_RDONLY | O_CLOEXEC);
-  const bool flushed = file >= 0 && fsync(file) == 0;
-  const int error = errno;
-  if (file >= 0) close(file);
-  if (!flushed) FailToWrite(shown_, std::string("can't be written: ") + std::strerror(error));
+  if (!Synced(temporary())) {
+    FailToWrite(shown_, std::string("can't be written: ") + std::strerror(errno));
+  }
   GiveName(temporary(), path_, overwrite_, shown_);
+  SyncFolderOf(path_);
 }
 
 OutputPictures::OutputPictures(const NumberedPath& paths, const std::vector<std::string>& sources,
@@ -183,6 +237,8 @@ void OutputPictures::Commit() {
   for (int i = 1; i <= count_; ++i) {
     GiveName(written.At(i), paths_.At(i), overwrite_, paths_.At(i));
   }
+  SyncFolderOf(paths_.At(1));
+  if (made_folder_) SyncFolderOf(std::filesystem::path(paths_.At(1)).parent_path().string());
 }
 
 }  // namespace calmframe::media

@@ -8,6 +8,21 @@
 
 namespace calmframe::media {
 
+// Has what a file holds, or the names that a folder has by now, outlast an end of the machine.
+// False with errno where that can't be had.
+bool Synced(const std::string& path);
+
+// Of the folder of `path`: a name that it was given lasts. Not every kind of disk does that for a
+// folder, and the file is whole under either name, so that nothing is told.
+void SyncFolderOf(const std::string& path);
+
+// What a folder has, "." and ".." too; nothing where it can't be read. The standard library's own
+// way there ends the process where it finds no memory. Empty is the present folder.
+std::vector<std::string> NamesIn(const std::string& folder);
+
+// Makes a folder with those above it that are missing; they last. Throws std::system_error.
+void MakeFolders(const std::string& path);
+
 // What is being written, a file or a folder, under a name of its own until it is whole; it goes
 // with this object. What programs that were killed have left in the same folder is removed too.
 class OutputPart {

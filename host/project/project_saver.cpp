@@ -1,9 +1,4 @@
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <optional>
@@ -11,6 +6,8 @@
 #include <utility>
 #include <vector>
 
+#include "host/media/clip.h"
+#include "host/media/output_file.h"
 #include "host/project/project_file.h"
 #include "host/project/project_format.h"
 #include "host/project/sqlite.h"
@@ -83,37 +80,21 @@ void Write(SqliteDatabase& database, const Project& project, const ClipPlaces& p
   frames.Step();
 }
 
-void Sync(const fs::path& place) {
-  const int file = open(place.c_str(), O_RDONLY | O_CLOEXEC);
-  if (file < 0) return;
-  fsync(file);
-  close(file);
-}
-
 // A new file gets its name when it is whole. fill(database) makes and fills its tables.
 template <class Fill>
-void Create(const fs::path& path, const Fill& fill) {
-  std::string temporary = path.parent_path() / ".";
-  temporary += path.filename().string();
-  temporary += ".XXXXXX";
-  const int made = mkstemp(temporary.data());
-  if (made < 0) Fail(path, std::strerror(errno));
-  fchmod(made, 0644);
-  close(made);
-  try {
-    {
-      SqliteDatabase database(temporary, SQLITE_OPEN_READWRITE);
-      database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
-      fill(database);
-      database.Run("COMMIT");
-    }
-    Sync(temporary);
-    fs::rename(temporary, path);
-    Sync(path.parent_path());
-  } catch (...) {
-    unlink(temporary.c_str());
-    throw;
+void Create(const fs::path& path, const Fill& fill) try {
+  const media::OutputPart part(path.parent_path().string(), false, path.string());
+  {
+    SqliteDatabase database(part.path(), SQLITE_OPEN_READWRITE);
+    database.Run("PRAGMA journal_mode = MEMORY; BEGIN");
+    fill(database);
+    database.Run("COMMIT");
   }
+  if (!media::Synced(part.path())) Fail(path, std::strerror(errno));
+  fs::rename(part.path(), path);
+  media::SyncFolderOf(path.string());
+} catch (const media::Failure& failure) {
+  throw ProjectFailure(failure.what());
 }
 
 }  // namespace
@@ -150,7 +131,7 @@ void ProjectSaver::Save(const Project& project, std::size_t changed) try {
   if (fs::exists(place, error)) {
     SqliteDatabase database(place, SQLITE_OPEN_READWRITE);
     CheckedVersion(place, database);
-    database.Run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
+    database.Run("PRAGMA synchronous = EXTRA; BEGIN IMMEDIATE");
     // Another program may have saved meanwhile.
     const bool is_known = before && CheckedVersion(place, database) == kProjectVersion &&
                           SavedChecksum(database) == before->whole;

@@ -10,6 +10,7 @@
 
 #include "platform/tessel/threads.h"
 #include "platform/tessel/threads_internal.h"
+#include "platform/tessel/undying.h"
 
 namespace tessel::threads {
 namespace {
@@ -157,8 +158,8 @@ class Pool {
 };
 
 Pool& pool() {
-  static Pool& pool = *new Pool;  // outlives its threads
-  return pool;
+  static utility::Undying<Pool> pool;  // outlives its threads
+  return *pool;
 }
 
 }  // namespace

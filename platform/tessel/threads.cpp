@@ -9,24 +9,19 @@
 #include <list>
 #include <mutex>
 #include <new>
-#include <stdexcept>
-#include <string_view>
 #include <thread>
 #include <utility>
 
 #include "platform/tessel/shutdown.h"
 #include "platform/tessel/threads_internal.h"
+#include "platform/tessel/undying.h"
 
 namespace tessel::threads {
 namespace {
 
-// A thread of the pool could not be started, for want of memory. The pool counts it all the same,
-// and whoever waits for its threads to leave waits for ever.
-std::atomic<bool> pool_lacks_a_thread = false;
-
-bool IsFailedStart(const std::runtime_error& error) {
-  return std::string_view(error.what()).starts_with("pthread_create");
-}
+// The pool itself had no memory, or a thread of it could not be started. It counts what it lacks
+// all the same, and whoever waits for its threads to leave waits for ever.
+std::atomic<bool> pool_is_broken = false;
 
 }  // namespace
 
@@ -34,7 +29,7 @@ void ExecuteCPUBoundTaskOnAllProcessors(const boost::function<void(std::size_t)>
                                         std::size_t count) {
   // The pool orders the tasks between the caller's code before and after them, but inside a library
   // that the thread sanitizer cannot see; these two say the same where it can.
-  std::atomic<bool> begun = false;
+  std::atomic<bool> begun = false, task_failed = false;
   std::atomic<std::size_t> ended = 0;
   struct End {
     ~End() { ended.fetch_add(1, std::memory_order_release); }
@@ -52,11 +47,16 @@ void ExecuteCPUBoundTaskOnAllProcessors(const boost::function<void(std::size_t)>
         [&](const tbb::blocked_range<std::size_t>& range) {
           (void)begun.load(std::memory_order_acquire);
           const End end{ended};
-          for (std::size_t i = range.begin(); i != range.end(); ++i) task(i);
+          try {
+            for (std::size_t i = range.begin(); i != range.end(); ++i) task(i);
+          } catch (...) {
+            task_failed = true;
+            throw;
+          }
         },
         tbb::simple_partitioner());
-  } catch (const std::runtime_error& error) {
-    if (IsFailedStart(error)) pool_lacks_a_thread = true;
+  } catch (...) {
+    if (!task_failed) pool_is_broken = true;
     throw;
   }
 }
@@ -72,7 +72,9 @@ ProcessorLimit::ProcessorLimit(int processors) {
   if (processors > 0) state_ = std::make_unique<State>(processors);
 }
 
-ProcessorLimit::~ProcessorLimit() = default;
+ProcessorLimit::~ProcessorLimit() {
+  if (pool_is_broken) (void)state_.release();  // its end waits for the pool's threads
+}
 
 namespace {
 
@@ -139,8 +141,8 @@ class LiveThreads {
 };
 
 LiveThreads& live_threads() {
-  static LiveThreads& threads = *new LiveThreads;  // outlives its threads
-  return threads;
+  static utility::Undying<LiveThreads> threads;  // outlives its threads
+  return *threads;
 }
 
 // The pool's threads are told to leave when the last thread that used it ends, and nobody waits for
@@ -148,9 +150,13 @@ LiveThreads& live_threads() {
 // The pool comes back with the next loop. Where another thread is still at a loop this waits for
 // nothing.
 void EndLoopThreads() {
-  if (pool_lacks_a_thread) return;
-  tbb::task_scheduler_handle pool{tbb::attach{}};
-  tbb::finalize(pool, std::nothrow);
+  if (pool_is_broken) return;
+  try {
+    tbb::task_scheduler_handle pool{tbb::attach{}};
+    tbb::finalize(pool, std::nothrow);
+  } catch (const std::bad_alloc&) {
+    pool_is_broken = true;
+  }
 }
 
 // What has ended is joined at the process's end, too, where nobody shut down.
@@ -178,8 +184,8 @@ Executor& GetCPUBoundExecutor() {
 }
 
 void Shutdown() {
-  static std::mutex& one_at_a_time = *new std::mutex;
-  std::lock_guard<std::mutex> lock(one_at_a_time);
+  static utility::Undying<std::mutex> one_at_a_time;
+  std::lock_guard<std::mutex> lock(*one_at_a_time);
   internal::BeginEndingPooledThreads();
   live_threads().WaitForNone();
   internal::FinishEndingPooledThreads();
