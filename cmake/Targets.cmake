@@ -37,12 +37,14 @@ function(calmframe_program name)
   target_link_libraries(${name} PRIVATE ${ARG_LINKS})
 endfunction()
 
-# calmframe_test(host_test [LABELS threads] [COST 1] SOURCES ... [LINKS ...] [DEPENDS ...] [DEFINITIONS ...]): adds tests to a program;
-# folders that link alike share one. Every suite of a program is a test of ctest, "host_test.FrameCacheTest".
-# Suites of a greater COST are run first: what takes minutes does not begin when all else is done.
-# LABELS threads: what the thread sanitizer runs, built by the target thread_tests. The reference loops of most tests are
-# short, so these programs are built quickly rather than to be quick; a source with long loops says so itself. Building them
-# is a third of a check: several sources are compiled as one, and undefined behaviour is looked for in what they test.
+# calmframe_test(host_test [LABELS threads] [COST 1] SOURCES ... [SINGLE_THREADED ...] [LINKS ...] [DEPENDS ...] [DEFINITIONS ...]):
+# adds tests to a program; folders that link alike share one. Every suite of a program is a test of ctest,
+# "host_test.FrameCacheTest". Suites of a greater COST are run first: what takes minutes does not begin when all else is done.
+# LABELS threads: what the thread sanitizer runs, built by the target thread_tests. SINGLE_THREADED: sources like the others whose
+# tests, and what they test, start no thread: it has nothing to say of them, and its build leaves them out.
+# The reference loops of most tests are short, so these programs are built quickly rather than to be quick; a source with long
+# loops says so itself. Building them is a third of a check: several sources are compiled as one, and undefined behaviour is
+# looked for in what they test.
 set(test_options -Wno-conversion -O1)
 if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
   list(APPEND test_options -Wno-subobject-linkage)
@@ -51,7 +53,10 @@ if(CALMFRAME_SANITIZE MATCHES "undefined")
   list(APPEND test_options -fno-sanitize=undefined)
 endif()
 function(calmframe_test name)
-  cmake_parse_arguments(ARG "" "LABELS;COST" "SOURCES;LINKS;DEPENDS;DEFINITIONS" ${ARGN})
+  cmake_parse_arguments(ARG "" "LABELS;COST" "SOURCES;SINGLE_THREADED;LINKS;DEPENDS;DEFINITIONS" ${ARGN})
+  if(NOT CALMFRAME_SANITIZE STREQUAL "thread")
+    list(APPEND ARG_SOURCES ${ARG_SINGLE_THREADED})
+  endif()
   if(NOT TARGET ${name})
     calmframe_program(${name} SOURCES ${ARG_SOURCES} LINKS ${ARG_LINKS} GTest::gmock GTest::gtest_main)
     target_compile_options(${name} PRIVATE ${test_options})

@@ -2,12 +2,11 @@
 // whose handles tell what isn't so.
 
 #include <filesystem>
-#include <fstream>
-#include <iostream>
 #include <stdexcept>
 #include <string>
 
 #include "fuzz/project_input.h"
+#include "fuzz/seeds.h"
 #include "platform/hx/hx_types.h"
 #include "stabilizer/effect/src/instance_handle.h"
 #include "stabilizer/effect/src/parameter_rules.h"
@@ -62,15 +61,10 @@ std::string WithHashes(std::string payload, int framing) {
 int main(int argc, char** argv) {
   using namespace calmframe::host;
   using kelp::effect::InstanceHandleHeader;
-  if (argc != 2) {
-    std::cerr << "project_corpus: name the folder\n";
-    return 2;
-  }
-  std::filesystem::create_directories(argv[1]);
+  const calmframe::fuzz::SeedFolder folder(argc, argv);
   const auto add = [&](const std::string& name, const ProjectInput& input,
                        const InstanceHandleHeader& header, const std::string& payload) {
-    const std::string instance =
-        std::string(reinterpret_cast<const char*>(&header), sizeof header) + payload;
+    const std::string instance = calmframe::fuzz::BytesOf(header) + payload;
     std::string packed = Packed(instance);
     if (Unpacked(packed.data(), packed.size()) != instance) throw std::logic_error(name);
     // The samples' analysis is told to begin elsewhere than its table does.
@@ -78,8 +72,7 @@ int main(int argc, char** argv) {
     if (const std::size_t place = packed.find(begin); place != std::string::npos) {
       packed.replace(place, begin.size(), R"("StartTime":{"value":7007,"scale":24000})");
     }
-    std::ofstream(std::filesystem::path(argv[1]) / name, std::ios::binary)
-        << std::string(reinterpret_cast<const char*>(&input), sizeof input) << packed;
+    folder.Add(name, calmframe::fuzz::BytesOf(input) + packed);
   };
   // The samples' two frames are 7 and 8, of 24000 in 1001 seconds.
   ProjectInput input{.ticks_per_frame = HX_TICKS_PER_SECOND * 1001 / 24000 - 1,

@@ -1,8 +1,6 @@
 // Whatever a project holds, a host can open it, draw a frame of it, save it and close it, and
 // nothing of it is left.
 
-#include <zlib.h>
-
 #include <boost/make_shared.hpp>
 #include <chrono>
 #include <cstdlib>
@@ -10,7 +8,6 @@
 #include <iostream>
 #include <map>
 #include <mutex>
-#include <stdexcept>
 #include <utility>
 
 #include "analysis/src/job_registry.h"
@@ -18,14 +15,12 @@
 #include "host/base/operations.h"
 #include "host/effects/session.h"
 #include "platform/hx/hx_controls.h"
-#include "stabilizer/effect/src/instance_handle.h"
 #include "tests/support/linked_plugin.h"
 #include "tests/support/shaky_clip.h"
 
 namespace {
 
 using namespace calmframe::host;
-using kelp::effect::InstanceHandleHeader;
 
 // Each frame is drawn once for all projects.
 class KeptSource final : public Source {
@@ -71,39 +66,17 @@ struct Stage {
   Session session{host};
 };
 
-std::string Deflated(const std::string& bytes) {
-  uLongf size = compressBound(bytes.size());
-  std::string deflated(size, '\0');
-  if (compress2(reinterpret_cast<Bytef*>(deflated.data()), &size,
-                reinterpret_cast<const Bytef*>(bytes.data()), bytes.size(), 1) != Z_OK) {
-    throw std::runtime_error("not deflated");
-  }
-  deflated.resize(size);
-  return deflated;
-}
-
-std::vector<std::uint8_t> InstanceIn(const ProjectInput& input, std::string instance) {
-  if (instance.size() >= sizeof(InstanceHandleHeader)) {
-    InstanceHandleHeader header;
-    std::memcpy(static_cast<void*>(&header), instance.data(), sizeof header);
-    if (input.flags & kToBeDeflated) {
-      const std::string payload = Deflated(instance.substr(sizeof header));
-      header.raw = 0;
-      header.payload_length = payload.size();
-      instance.assign(reinterpret_cast<const char*>(&header), sizeof header);
-      instance += payload;
-    } else if (header.payload_length == kAllThatFollow) {
-      header.payload_length = instance.size() - sizeof header;
-      std::memcpy(instance.data(), &header, sizeof header);
-    }
-  }
-  return {instance.begin(), instance.end()};
-}
-
 void Expect(bool holds, const char* what) {
   if (holds) return;
   std::cerr << what << '\n' << Ledger::Get().Report();
   std::abort();
+}
+
+HX_Handle GlobalData(Host& host) {
+  HX_InData in{};
+  HX_OutData out{};
+  host.Command(HX_CMD_ABOUT, in, out);
+  return in.global_data;
 }
 
 // Until nothing is under way, by turns with the threads that do it.
@@ -112,24 +85,11 @@ void Settle(Stage& stage, Effect& effect) {
   for (int turn = 0; turn < kMostTurns; ++turn) {
     if (!effect.Tick().ok()) return;
     if (turn > 2 && Session::WorkOf(effect) == Session::Work::none) return;
-    stage.host.WaitForWake(std::chrono::milliseconds(1));
+    stage.host.wake()->Wait(std::chrono::milliseconds(1));
   }
 }
 
 }  // namespace
-
-// What is freed waits in the quarantine while a run or two go on, and not in memory that is new to
-// the processor.
-extern "C" const char* __asan_default_options() {
-  return "quarantine_size_mb=4:malloc_context_size=6";
-}
-// What the libraries keep is told in cmake/lsan.supp for the tests; here there are few.
-extern "C" const char* __lsan_default_suppressions() {
-  return "leak:libfontconfig\n";
-}
-extern "C" const char* __lsan_default_options() {
-  return "print_suppressions=0";
-}
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   static Stage& stage = *new Stage;
@@ -143,8 +103,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   saved.values[declared[1 + input.control % (declared.size() - 1)].disk_id] = input.value;
   saved.values[HX_FRAMING.disk_id] = 1 + input.framing % 4;
   if (!(input.flags & kBanner)) saved.values[HX_HIDE_WARNING_BANNER.disk_id] = 1;
-  saved.instance = InstanceIn(
-      input, Unpacked(reinterpret_cast<const char*>(data) + sizeof input, size - sizeof input));
+  saved.instance =
+      InstanceIn(Unpacked(reinterpret_cast<const char*>(data) + sizeof input, size - sizeof input),
+                 (input.flags & kToBeDeflated) != 0);
   const auto layer = boost::make_shared<Layer>(SourceFor(input.flags));
   layer->Change([&input](LayerState& state) {
     state.start_frame = input.start_frame;
@@ -175,7 +136,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   effect.Save(&again);
   stage.session.Remove(effect);
   // What has ended waits half a minute for others that want it.
-  kelp::analysis::JobRegistry::Instance().CancelAll();
+  kelp::analysis::JobRegistry::Instance().CancelAll(GlobalData(stage.host));
   Expect(stage.host.handles().count() == 1, "handles are left");  // the plug-in's global data
   Expect(stage.host.worlds().count() == 0, "frames are left");
   Expect(Ledger::Get().mistakes().empty(), "mistakes were made");

@@ -1,10 +1,16 @@
 #pragma once
 
+#include <zlib.h>
+
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <stdexcept>
 #include <string>
+#include <vector>
+
+#include "stabilizer/effect/src/instance_handle.h"
 
 // How the fuzzer's input tells of a project: these bytes, then those of the saved instance, packed.
 namespace calmframe::host {
@@ -108,6 +114,38 @@ inline std::string Packed(const std::string& bytes) {
     }
   }
   return packed;
+}
+
+inline std::string Deflated(const std::string& bytes) {
+  uLongf size = compressBound(bytes.size());
+  std::string deflated(size, '\0');
+  if (compress2(reinterpret_cast<Bytef*>(deflated.data()), &size,
+                reinterpret_cast<const Bytef*>(bytes.data()), bytes.size(), 1) != Z_OK) {
+    throw std::runtime_error("not deflated");
+  }
+  deflated.resize(size);
+  return deflated;
+}
+
+// The bytes of an instance whose header's length is to be that of what follows; with the payload
+// compressed where it is to be.
+inline std::vector<std::uint8_t> InstanceIn(std::string instance, bool to_be_deflated) {
+  using kelp::effect::InstanceHandleHeader;
+  if (instance.size() >= sizeof(InstanceHandleHeader)) {
+    InstanceHandleHeader header;
+    std::memcpy(static_cast<void*>(&header), instance.data(), sizeof header);
+    if (to_be_deflated) {
+      const std::string payload = Deflated(instance.substr(sizeof header));
+      header.raw = 0;
+      header.payload_length = payload.size();
+      instance.assign(reinterpret_cast<const char*>(&header), sizeof header);
+      instance += payload;
+    } else if (header.payload_length == kAllThatFollow) {
+      header.payload_length = instance.size() - sizeof header;
+      std::memcpy(instance.data(), &header, sizeof header);
+    }
+  }
+  return {instance.begin(), instance.end()};
 }
 
 }  // namespace calmframe::host

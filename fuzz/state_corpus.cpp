@@ -1,24 +1,18 @@
-// Writes a corpus for state_reader_fuzz into a folder: payloads of every version.
+// Writes a corpus for state_fuzz into a folder: payloads of every version.
 
 #include <filesystem>
-#include <fstream>
-#include <iostream>
 
+#include "fuzz/seeds.h"
 #include "fuzz/state_input.h"
 #include "tests/stabilizer/effect/state_format/samples.h"
 
 int main(int argc, char** argv) {
   using namespace kelp::effect;
-  if (argc != 2) {
-    std::cerr << "state_corpus: name the folder\n";
-    return 2;
-  }
-  std::filesystem::create_directories(argv[1]);
+  const calmframe::fuzz::SeedFolder folder(argc, argv);
   int count = 0;
   const auto add = [&](std::uint32_t version, std::uint8_t flags, const std::string& payload) {
     const std::string name = "v" + std::to_string(version) + "_" + std::to_string(count++);
-    std::ofstream(std::filesystem::path(argv[1]) / name, std::ios::binary)
-        << StateInput(version, flags, payload);
+    folder.Add(name, StateInput(version, flags, payload));
   };
   for (const auto& file : std::filesystem::directory_iterator(CALMFRAME_SAMPLES)) {
     const Sample sample = ReadSample(file.path().filename());

@@ -1,9 +1,8 @@
 // studio_corpus FOLDER: inputs for studio_fuzz, each a request as the page sends it, or a message.
 
-#include <filesystem>
-#include <fstream>
 #include <string>
 
+#include "fuzz/seeds.h"
 #include "fuzz/studio_input.h"
 #include "studio/wire/message.h"
 
@@ -30,13 +29,10 @@ std::string Do(const std::string& op, const std::string& rest = "") {
 }  // namespace
 
 int main(int argc, char** argv) {
-  if (argc != 2) return 2;
-  const std::filesystem::path folder = argv[1];
-  std::filesystem::create_directories(folder);
+  const calmframe::fuzz::SeedFolder folder(argc, argv);
   int count = 0;
   const auto write = [&](std::uint8_t what, const std::string& input) {
-    std::ofstream(folder / std::to_string(count++), std::ios::binary)
-        << static_cast<char>(what) << input;
+    folder.Add(std::to_string(count++), static_cast<char>(what) + input);
   };
   for (const char* line :
        {"GET /", "GET /app.mjs", "GET /api/events", "GET /api/folder?path=%2Ftmp", "HEAD /",

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <vector>
 
+#include "host/media/ffmpeg.h"
 #include "host/timeline/source.h"
 #include "library/plugin_place.h"
 #include "library/refusal.h"
@@ -24,6 +25,8 @@ media::ClipInfo ClipOf(const calmframe_options& options) {
   Expect(options.frame_count > 0 && options.frame_count <= kMostFrames,
          "frame_count is " + std::to_string(options.frame_count) + ", and 1 to 10000000 go");
   Expect(options.full_range == 0 || options.full_range == 1, "full_range is neither 0 nor 1");
+  Expect(options.matrix >= 0 && options.matrix < AVCOL_SPC_NB,
+         "matrix " + std::to_string(options.matrix) + ": there is none such");
   Expect(options.chroma_location >= 1 && options.chroma_location <= 6,
          "chroma_location is none of 1 to 6");
   media::ClipInfo clip;

@@ -5,6 +5,7 @@
 #include <nlohmann/json.hpp>
 #include <vector>
 
+#include "apps/calmframe/confinement.h"
 #include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
@@ -55,6 +56,7 @@ AnalyzeCommand::AnalyzeCommand(CLI::App& program)
 }
 
 void AnalyzeCommand::Run() {
+  Confinement{.read = {input_}, .written = {project_}}.Begin();
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
   RunOnPromises([&](host::Opening opening) { Analyze(opening, progress); });

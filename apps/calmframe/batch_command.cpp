@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "apps/calmframe/batch_results.h"
+#include "apps/calmframe/confinement.h"
 #include "apps/calmframe/exit_codes.h"
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/film_work.h"
@@ -274,6 +275,7 @@ BatchShotsCommand::BatchShotsCommand(CLI::App& program)
 }
 
 void BatchShotsCommand::Run() {
+  Confinement{.read = {input_}, .written = {output_}}.Begin();
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
   RunOnPromises([&](host::Opening opening) { Find(opening, progress); });
@@ -317,6 +319,19 @@ void BatchJobCommand::Run() {
   if (InterruptAsked()) throw Interrupted();
 }
 
+BatchGlancesCommand::BatchGlancesCommand(CLI::App& program)
+    : Command(*program.add_subcommand(batch::kGlancesCommand)->group("")) {
+  AddFiles(parser_, "IN", inputs_, "");
+}
+
+void BatchGlancesCommand::Run() {
+  Confinement{.read = inputs_}.Begin();
+  for (const std::string& input : inputs_) {
+    std::printf("%s\n", batch::GlanceText(input).c_str());
+    std::fflush(stdout);
+  }
+}
+
 BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)
     : Command(*program.add_subcommand("batch-pictures")->group("")) {
   AddFile(parser_, "BEFORE", before_, "");
@@ -324,6 +339,7 @@ BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)
 }
 
 void BatchPicturesCommand::Run() {
+  Confinement{.read = {before_, after_}}.Begin();
   const ThumbnailSource before(before_), after(after_);
   std::printf("%s\n", Thumbnails(before.view(), after.view()).dump().c_str());
 }

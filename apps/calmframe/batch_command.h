@@ -74,6 +74,16 @@ class BatchShotsCommand final : public Command {
   RunFlags run_;
 };
 
+// Nor is this: see batch::kGlancesCommand.
+class BatchGlancesCommand final : public Command {
+ public:
+  explicit BatchGlancesCommand(CLI::App& program);
+  void Run() override;
+
+ private:
+  std::vector<std::string> inputs_;
+};
+
 // Nor is this: prints how a clip looks before and after as an object,
 // for the page of a batch, whose own process opens no clip for it.
 class BatchPicturesCommand final : public Command {

@@ -154,7 +154,8 @@ constexpr char kFooter[] =
     "  130  interrupted\n"
     "\n"
     "Environment:\n"
-    "  CALMFRAME_PLUGIN  the plug-in to load in place of the one that came along";
+    "  CALMFRAME_PLUGIN  the plug-in to load in place of the one that came along\n"
+    "  CALMFRAME_NO_SANDBOX  not empty: as --no-sandbox for all that is run";
 
 int Run(int argc, char** argv) {
   CLI::App program(kDescription, "calmframe");
@@ -179,6 +180,7 @@ int Run(int argc, char** argv) {
   ReportCommand report(program);
   StudioWorkerCommand studio_worker(program);
   BatchJobCommand batch_job(program);
+  BatchGlancesCommand batch_glances(program);
   BatchPicturesCommand batch_pictures(program);
   BatchShotsCommand batch_shots(program);
   WriteCommand man_page(program, "write-man-page", [](const CLI::App& app) {
@@ -188,9 +190,10 @@ int Run(int argc, char** argv) {
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
   Command* const commands[] = {
-      &stabilize,      &studio,      &batch,     &demo,          &analyze, &params, &shots,
-      &render,         &info,        &tracks,    &report,        &gather,  &join,   &man_page,
-      &batch_pictures, &batch_shots, &batch_job, &studio_worker, &bash,    &zsh,    &fish};
+      &stabilize,     &studio,         &batch,       &demo,      &analyze,       &params, &shots,
+      &render,        &info,           &tracks,      &report,    &gather,        &join,   &man_page,
+      &batch_glances, &batch_pictures, &batch_shots, &batch_job, &studio_worker, &bash,   &zsh,
+      &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;

@@ -53,7 +53,8 @@ void RenderCommand::Run() {
   const tessel::threads::ProcessorLimit limit(run_.threads);
   ProgressLine progress(run_.progress_form());
   CheckOrder(stretch_);
-  const std::unique_ptr<host::Film> film = OpenSaved(project_);
+  const std::unique_ptr<host::Film> film =
+      OpenSaved(project_, {.written = {output_, flags_.side_by_side}});
   const media::FrameRange range = RangeOf(*film);
   KeepApart(output_, {project_, film->whole().path});
   const media::ClipInfo written = WrittenAs(media::PartOf(film->whole(), range), flags_);
@@ -153,11 +154,12 @@ TracksCommand::TracksCommand(CLI::App& program)
   AddFile(parser_, "OUT", output_, "The track file, .trk");
   AddShotFlag(parser_, shot_);
   AddSwitch(parser_, "--overwrite", overwrite_, "Replace OUT where it exists");
+  AddSandboxFlag(parser_);
 }
 
 void TracksCommand::Run() {
   media::OutputFile file(output_, project_, overwrite_);
-  const std::unique_ptr<host::Film> film = OpenSaved(project_);
+  const std::unique_ptr<host::Film> film = OpenSaved(project_, {.written = {output_}});
   KeepApart(output_, {film->whole().path});
   SaveTracks(SavedShotOf(*film, project_, shot_), project_, file.temporary(), output_);
   file.Commit();

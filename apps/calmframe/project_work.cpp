@@ -89,10 +89,13 @@ std::string FindMovedClip(const std::string& path, host::Project& project) {
   return clip;
 }
 
-std::unique_ptr<host::Film> OpenSaved(const std::string& path, const host::ShotRequest& shots) {
+std::unique_ptr<host::Film> OpenSaved(const std::string& path, Confinement confinement) {
   host::Project project = host::LoadProject(path);
   const std::string clip = FindMovedClip(path, project);
-  return std::make_unique<host::Film>(PluginPath(), project, clip, shots);
+  confinement.read.push_back(clip);
+  confinement.written.push_back(path);
+  confinement.Begin();
+  return std::make_unique<host::Film>(PluginPath(), project, clip);
 }
 
 void KeepApart(const std::string& output, const std::vector<std::string>& inputs,

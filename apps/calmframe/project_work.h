@@ -5,6 +5,7 @@
 #include <utility>
 #include <vector>
 
+#include "apps/calmframe/confinement.h"
 #include "apps/calmframe/controls.h"
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/progress_line.h"
@@ -45,10 +46,9 @@ std::string WorkedText(const host::Film& film);
 // host::FindClip.
 std::string FindMovedClip(const std::string& path, host::Project& project);
 
-// The clip of saved work, found by its name or beside it. Throws media::Failure,
-// host::ProjectFailure.
-std::unique_ptr<host::Film> OpenSaved(const std::string& project,
-                                      const host::ShotRequest& shots = {});
+// The clip of saved work, found by its name or beside it, opened as the process reaches these two
+// and what else `confinement` has from now on. Throws media::Failure, host::ProjectFailure.
+std::unique_ptr<host::Film> OpenSaved(const std::string& project, Confinement confinement);
 
 // Nothing of the user's is written over by a result of it: throws media::Failure (output) where
 // `output` is one of `inputs` under any name. Empty names stand for no file. `what` one of them is,

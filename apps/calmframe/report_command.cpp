@@ -123,7 +123,8 @@ std::vector<double> Draw(host::SteadyClip& clip, int threads, ProgressLine& prog
 }
 
 // The film of saved work, or where its clip is gone a stand-in for it, and a line that says so.
-std::unique_ptr<host::Film> OpenForReport(const std::string& path, std::string* gone) {
+std::unique_ptr<host::Film> OpenForReport(const std::string& path, Confinement confinement,
+                                          std::string* gone) {
   host::Project project = host::LoadProject(path);
   std::string clip;
   try {
@@ -132,6 +133,8 @@ std::unique_ptr<host::Film> OpenForReport(const std::string& path, std::string* 
     *gone = failure.what();
     return std::make_unique<host::Film>(PluginPath(), project);
   }
+  confinement.read.push_back(clip);
+  confinement.Begin();
   return std::make_unique<host::Film>(PluginPath(), project, clip);
 }
 
@@ -166,7 +169,8 @@ void ReportCommand::Run() {
   ProgressLine progress(run_.progress_form());
   media::OutputFile file(output_, project_, overwrite_);
   std::string gone;
-  const std::unique_ptr<host::Film> film = OpenForReport(project_, &gone);
+  const std::unique_ptr<host::Film> film =
+      OpenForReport(project_, {.written = {output_, project_}}, &gone);
   host::SteadyClip* const clip = &SavedShotOf(*film, project_, shot_);
   KeepApart(output_, {clip->path()});
   const media::ClipInfo& info = clip->info();

@@ -5,6 +5,7 @@
 #include <nlohmann/json.hpp>
 #include <vector>
 
+#include "apps/calmframe/confinement.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "host/shots/shot_list.h"
@@ -60,6 +61,7 @@ ShotsCommand::ShotsCommand(CLI::App& program)
 }
 
 void ShotsCommand::Run() {
+  Confinement{.read = {input_}}.Begin();
   ProgressLine progress(run_.progress_form());
   CheckOrder(stretch_);
   RunOnPromises([&](host::Opening opening) { List(opening, progress); });

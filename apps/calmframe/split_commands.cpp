@@ -65,7 +65,8 @@ JoinCommand::JoinCommand(CLI::App& program)
 
 void JoinCommand::Run() {
   ProgressLine progress(run_.progress_form());
-  const std::unique_ptr<host::Film> film = OpenSaved(project_);
+  const std::unique_ptr<host::Film> film =
+      OpenSaved(project_, {.read = segments_, .written = {output_}});
   std::vector<std::string> inputs = segments_;
   inputs.insert(inputs.end(), {project_, film->whole().path});
   KeepApart(output_, inputs);

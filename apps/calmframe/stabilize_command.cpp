@@ -6,6 +6,7 @@
 #include <nlohmann/json.hpp>
 #include <string>
 
+#include "apps/calmframe/confinement.h"
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/film_work.h"
 #include "apps/calmframe/flags.h"
@@ -83,6 +84,7 @@ void AddRunFlags(CLI::App& command, RunFlags& flags) {
                                       "Show progress, warnings, errors and what came out as JSON "
                                       "objects, one a line, for programs");
   PutInGroup("Running", {threads, quiet, json});
+  AddSandboxFlag(command);
 }
 
 void AddWindowFlags(CLI::App& command, host::WindowSettings& window) {
@@ -244,6 +246,7 @@ StabilizeCommand::StabilizeCommand(CLI::App& program)
 }
 
 void StabilizeCommand::Run() {
+  Confinement{.read = {input_}, .written = {output_, flags_.side_by_side, project_}}.Begin();
   ProgressLine progress(run_.progress_form());
   Stabilize(input_, output_, project_, stretch_, shots_, controls_, flags_, run_.threads, progress);
 }

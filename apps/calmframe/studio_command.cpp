@@ -13,6 +13,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "apps/calmframe/confinement.h"
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/plugin_path.h"
@@ -27,7 +28,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr char kWorker[] = "studio-worker";
+constexpr char kWorker[] = "studio-worker", kWorkerFolder[] = "--in";
 
 std::string Environment(const char* name) {
   const char* const value = std::getenv(name);
@@ -105,6 +106,7 @@ StudioCommand::StudioCommand(CLI::App& program)
        AddFile(parser_, "--password-file", password_file_,
                "A file whose first line is the password", Need::optional),
        AddName(parser_, "--name", name_, "Name of this machine by which others call the page")});
+  AddSandboxFlag(parser_);
 }
 
 void StudioCommand::Run() {
@@ -131,6 +133,11 @@ void StudioCommand::Run() {
   if (roots.empty()) roots.push_back(fs::current_path());
   std::sort(roots.begin(), roots.end());
   roots.erase(std::unique(roots.begin(), roots.end()), roots.end());
+  for (const std::string& folder : roots) {
+    settings.studio.worker.insert(settings.studio.worker.end(), {kWorkerFolder, folder});
+  }
+  settings.studio.worker.insert(settings.studio.worker.end(),
+                                {kWorkerFolder, settings.studio.WorkFolder()});
   settings.listens = [this](const std::string& address) {
     std::printf("%s\n", address.c_str());
     std::fflush(stdout);
@@ -148,6 +155,7 @@ void StudioCommand::Run() {
 StudioWorkerCommand::StudioWorkerCommand(CLI::App& program)
     : Command(*program.add_subcommand(kWorker)->group("")) {
   parser_.add_option("SOCKET", socket_)->required();
+  parser_.add_option(kWorkerFolder, folders_)->allow_extra_args(false);
 }
 
 void StudioWorkerCommand::Run() {
@@ -155,6 +163,7 @@ void StudioWorkerCommand::Run() {
   std::signal(SIGTERM, SIG_DFL);
   std::signal(SIGINT, SIG_IGN);
   fcntl(socket_, F_SETFD, FD_CLOEXEC);
+  Confinement{.folders = folders_}.Begin();
   studio::RunWorker(socket_, PluginPath());
 }
 

@@ -28,6 +28,7 @@ class StudioWorkerCommand final : public Command {
 
  private:
   int socket_ = -1;
+  std::vector<std::string> folders_;  // that it may read and write
 };
 
 }  // namespace calmframe

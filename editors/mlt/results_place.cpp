@@ -67,10 +67,11 @@ std::string ResultsName(const std::string& clip, const ClipFrames& frames, const
 std::string FindResults(const std::string& path, const std::string& clip) {
   std::error_code ignored;
   if (fs::path(path).is_absolute() || fs::exists(path, ignored)) return path;
-  for (const fs::path& folder : {fs::path(clip).parent_path(), fs::path(ResultsFolder())}) {
-    if (fs::exists(folder / path, ignored)) return folder / path;
-  }
-  return path;
+  const fs::path beside = fs::path(clip).parent_path() / path;
+  if (fs::exists(beside, ignored)) return beside;
+  // Not needed for more, it may be unknown.
+  const fs::path kept = fs::path(ResultsFolder()) / path;
+  return fs::exists(kept, ignored) ? kept.string() : path;
 }
 
 }  // namespace calmframe::mlt

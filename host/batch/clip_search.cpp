@@ -1,7 +1,5 @@
 #include "host/batch/clip_search.h"
 
-#include <glob.h>
-
 #include <algorithm>
 #include <cctype>
 #include <cstring>
@@ -14,6 +12,7 @@
 
 #include "host/batch/record.h"
 #include "host/batch/task_folder.h"
+#include "host/media/file_pattern.h"
 
 namespace calmframe::batch {
 namespace {
@@ -117,21 +116,16 @@ class Search {
   }
 
   void TakePattern(const std::string& pattern) {
-    glob_t matches{};
-    if (glob(pattern.c_str(), GLOB_BRACE, nullptr, &matches) == 0) {
-      for (std::size_t m = 0; m < matches.gl_pathc; ++m) {
-        const std::string match = matches.gl_pathv[m];
-        std::error_code error;
-        if (fs::is_directory(match, error)) {
-          TakeFolder(match);
-        } else {
-          Add(match, "");
-        }
+    const std::vector<std::string> matches = media::FilesNamedLike(pattern);
+    if (matches.empty()) return Refuse(pattern, "no file has such a name");
+    for (const std::string& match : matches) {
+      std::error_code error;
+      if (fs::is_directory(match, error)) {
+        TakeFolder(match);
+      } else {
+        Add(match, "");
       }
-    } else {
-      Refuse(pattern, "no file has such a name");
     }
-    globfree(&matches);
   }
 
   // By the records of a batch whose folder is one of those that the file lies in.

@@ -12,6 +12,7 @@
 #include <nlohmann/json.hpp>
 #include <system_error>
 
+#include "host/base/json_depth.h"
 #include "host/media/output_file.h"
 
 namespace calmframe::batch {
@@ -70,6 +71,7 @@ std::optional<nlohmann::ordered_json> ReadObject(const std::string& path) {
   } catch (const std::ios_base::failure&) {  // of the disk, which iterators throw
     return std::nullopt;
   }
+  if (NestsTooDeep(text)) return std::nullopt;
   auto object = nlohmann::ordered_json::parse(text, nullptr, false);
   if (!object.is_object()) return std::nullopt;
   return object;

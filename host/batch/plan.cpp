@@ -2,6 +2,7 @@
 
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <filesystem>
 #include <map>
@@ -11,6 +12,7 @@
 #include <system_error>
 #include <utility>
 
+#include "host/batch/child.h"
 #include "host/media/clip.h"
 #include "host/media/glance.h"
 #include "platform/tessel/threads.h"
@@ -27,6 +29,47 @@ constexpr double kProgramBytes = 160 << 20, kBytesAPixel = 200, kBytesAFrame = 1
 void Refuse(Task& task, const std::string& why, int code) {
   task.refused = why;
   task.refused_code = code;
+}
+
+// Of a clip that doesn't tell.
+constexpr media::Glance kUnknown = {1920, 1080, 1000};
+
+void Expect(const media::Glance& clip, Task& task) {
+  const double frames = clip.frames > 0 ? clip.frames : kUnknown.frames;
+  task.cost = frames * clip.width * clip.height;
+  task.memory = ExpectedMemory(clip.width, clip.height, frames);
+}
+
+// Clips that one process looks at: its start takes as long as some tens of them.
+constexpr std::size_t kFewAPart = 32, kMostAPart = 512;
+
+// Takes what a process of its own says of the clips, a line each: how many it came to.
+std::size_t Glances(const std::string& program, const std::vector<Task*>& tasks,
+                    const std::function<bool()>& stops) try {
+  std::vector<std::string> words = {program, kGlancesCommand};
+  for (const Task* task : tasks) words.push_back(task->source);
+  Child child(words);
+  std::size_t done = 0;
+  std::string line;
+  while (done < tasks.size()) {
+    constexpr int kPatience = 100;  // ms
+    const Child::Said said = child.Next(line, kPatience);
+    if (said == Child::Said::end || stops()) break;
+    if (said == Child::Said::nothing) continue;
+    const auto json = nlohmann::ordered_json::parse(line, nullptr, false);
+    if (!json.is_object()) continue;  // what a library says
+    Task& task = *tasks[done++];
+    if (json.contains("refused")) {
+      // Its name as it was asked for stands before all that is told of it.
+      const std::string why = BytesOf(json["refused"]), begin = task.source + ": ";
+      Refuse(task, Shown(why.starts_with(begin) ? why.substr(begin.size()) : why), kInputCode);
+    } else {
+      Expect({json.value("width", 0), json.value("height", 0), json.value("frames", 0.0)}, task);
+    }
+  }
+  return done;
+} catch (const std::system_error&) {
+  return tasks.size();  // it can't be started; what comes of it is told by the clips' own runs
 }
 
 std::optional<std::pair<dev_t, ino_t>> FileAt(const std::string& path) {
@@ -96,25 +139,40 @@ std::int64_t ExpectedMemory(double width, double height, double frames) {
                                    kBytesAFrame * frames);
 }
 
+std::string GlanceText(const std::string& path) {
+  nlohmann::ordered_json json;
+  try {
+    const media::Glance clip = media::GlanceAt(path);
+    json = {{"width", clip.width}, {"height", clip.height}, {"frames", clip.frames}};
+  } catch (const media::Failure& failure) {
+    json["refused"] = JsonOfBytes(failure.what());
+  }
+  return json.dump();
+}
+
 void Appraise(Plan& plan, const std::function<bool()>& stops) {
+  std::vector<Task*> tasks;
+  for (Task& task : plan.tasks) {
+    if (!task.refused.empty() || stops() || DoneRecord(plan, task)) continue;
+    Expect(kUnknown, task);
+    tasks.push_back(&task);
+  }
+  const std::size_t parts =
+      std::max<std::size_t>((tasks.size() + kMostAPart - 1) / kMostAPart,
+                            std::min(tasks.size() / kFewAPart + 1, std::size_t{16}));
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
-      [&](std::size_t n) {
-        Task& task = plan.tasks[n];
-        if (!task.refused.empty() || stops() || DoneRecord(plan, task)) return;
-        try {
-          const media::Glance clip = media::GlanceAt(task.source);
-          constexpr double kSomeFrames = 1000;  // where nobody knows
-          const double frames = clip.frames > 0 ? clip.frames : kSomeFrames;
-          task.cost = frames * clip.width * clip.height;
-          task.memory = ExpectedMemory(clip.width, clip.height, frames);
-        } catch (const media::Failure& failure) {
-          // Its name as it was asked for stands before all that is told of it.
-          const std::string line = failure.what(), begin = task.source + ": ";
-          Refuse(task, Shown(line.starts_with(begin) ? line.substr(begin.size()) : line),
-                 kInputCode);
+      [&](std::size_t part) {
+        std::vector<Task*> mine;
+        for (std::size_t n = part; n < tasks.size(); n += parts) mine.push_back(tasks[n]);
+        std::size_t done = 0;
+        while (done < mine.size() && !stops()) {
+          // One that ended early had trouble with the next, which comes up again in its own run.
+          done += Glances(plan.program,
+                          {mine.begin() + static_cast<std::ptrdiff_t>(done), mine.end()}, stops) +
+                  1;
         }
       },
-      plan.tasks.size());
+      parts);
 }
 
 std::string TextOf(const Plan& plan) {

@@ -66,9 +66,15 @@ void AddTasks(const std::vector<FoundClip>& clips, const std::string& name_templ
 // none where there is something to do.
 std::optional<Record> DoneRecord(const Plan& plan, const Task& task);
 
-// Opens the clips of all tasks that are left to do, some at a time, for what they are expected to
-// take; those that can't be opened are refused. Once `stops` is true, no more of them.
+// Looks at the clips of all tasks that are left to do for what they are expected to take; those
+// that can't be opened are refused. It is processes of the plan's program that open them, some at a
+// time: none of them brings this one down. Once `stops` is true, no more of them.
 void Appraise(Plan& plan, const std::function<bool()>& stops);
+
+// The program's command that such a process runs, with the clips behind it, and the line that it
+// writes of each in turn: a JSON object of media::Glance, or with "refused", which says why.
+inline constexpr char kGlancesCommand[] = "batch-glances";
+std::string GlanceText(const std::string& path);
 
 // Bytes at the peak, from frames of that size and number.
 std::int64_t ExpectedMemory(double width, double height, double frames);

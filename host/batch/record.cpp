@@ -23,9 +23,11 @@ std::vector<std::string> ListOf(const nlohmann::ordered_json& json) {
   return words;
 }
 
-Record RecordOf(const nlohmann::ordered_json& json) {
+// None of a state that there is not.
+std::optional<Record> RecordOf(const nlohmann::ordered_json& json) {
   Record record;
   const auto state = std::find(std::begin(kStates), std::end(kStates), json.at("state"));
+  if (state == std::end(kStates)) return std::nullopt;
   record.state = static_cast<Record::State>(state - std::begin(kStates));
   record.run = json.value("run", "");
   record.source = BytesOf(json.at("source"));

@@ -15,6 +15,7 @@
 #include <system_error>
 #include <utility>
 
+#include "host/base/json_depth.h"
 #include "host/batch/child.h"
 #include "host/media/clip.h"
 #include "host/media/output_file.h"
@@ -236,6 +237,7 @@ class Run {
   }
 
   void Hear(const std::string& line) {
+    if (NestsTooDeep(line)) return;
     const auto json = nlohmann::ordered_json::parse(line, nullptr, false);
     if (!json.is_object()) return;
     try {

@@ -19,6 +19,7 @@ namespace calmframe::batch {
 namespace {
 
 namespace fs = std::filesystem;
+using Clock = std::chrono::steady_clock;
 
 // An array has at most 1,001 jobs where nobody has set MaxArraySize.
 constexpr std::size_t kMostGroups = 1000;
@@ -308,7 +309,6 @@ void SlurmBatch::Cancel() {
 }
 
 void SlurmBatch::Wait() {
-  using Clock = std::chrono::steady_clock;
   Clock::time_point looked = Clock::now();
   while (std::find(ended_.begin(), ended_.end(), false) != ended_.end()) {
     if (watcher_.Stops()) return Cancel();

@@ -1,7 +1,6 @@
 #include "host/media/clip_files.h"
 
 #include <fcntl.h>
-#include <glob.h>
 #include <poll.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -17,6 +16,7 @@
 #include <utility>
 
 #include "host/media/ffmpeg.h"
+#include "host/media/file_pattern.h"
 
 namespace calmframe::media {
 namespace {
@@ -135,11 +135,7 @@ ClipFiles Globbed(const std::string& shown, const std::string& pattern) {
   ClipFiles files;
   files.is_glob = true;
   files.pattern = fs::absolute(pattern).string();
-  glob_t found{};
-  if (glob(files.pattern.c_str(), GLOB_BRACE, nullptr, &found) == 0) {
-    files.paths.assign(found.gl_pathv, found.gl_pathv + found.gl_pathc);
-  }
-  globfree(&found);
+  files.paths = FilesNamedLike(files.pattern);
   if (files.paths.empty()) Refuse(shown, "no file has such a name");
   CheckPlain(files.paths);
   CheckOrder(shown, files.paths);

@@ -1,8 +1,32 @@
 #include "host/media/colour_model.h"
 
 #include <cstring>
+#include <type_traits>
+#include <utility>
 
 namespace calmframe::media {
+namespace {
+
+// What stands in an enumeration's place, as long as it is one of the first `count` values: any
+// other may not even be looked at as one.
+template <class Code>
+int Known(const Code& code, int count, int not_told) {
+  std::underlying_type_t<Code> number;
+  std::memcpy(&number, &code, sizeof number);
+  return std::in_range<int>(number) && number < static_cast<decltype(number)>(count)
+             ? static_cast<int>(number)
+             : not_told;
+}
+
+}  // namespace
+
+ColourTags TagsOf(const AVFrame& frame) {
+  return {Known(frame.color_primaries, AVCOL_PRI_NB, AVCOL_PRI_UNSPECIFIED),
+          Known(frame.color_trc, AVCOL_TRC_NB, AVCOL_TRC_UNSPECIFIED),
+          Known(frame.colorspace, AVCOL_SPC_NB, AVCOL_SPC_UNSPECIFIED),
+          Known(frame.color_range, AVCOL_RANGE_NB, AVCOL_RANGE_UNSPECIFIED),
+          Known(frame.chroma_location, AVCHROMA_LOC_NB, AVCHROMA_LOC_UNSPECIFIED)};
+}
 
 ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int height) {
   ColourModel model;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "host/media/clip.h"
 #include "host/media/ffmpeg.h"
 
 namespace calmframe::media {
@@ -12,6 +13,10 @@ struct ColourModel {
   bool fields = false;  // 4:2:0 chroma belongs to each field
   bool operator==(const ColourModel&) const = default;
 };
+
+// The frame's. A code point that FFmpeg doesn't know, which bitstreams may tell all the same,
+// counts as not told.
+ColourTags TagsOf(const AVFrame& frame);
 
 // width, height: of the clip; BT.709 from 720 lines or 1280 columns on, BT.601 below.
 ColourModel ModelOf(const ColourTags& tags, AVPixelFormat format, int width, int height);

@@ -7,6 +7,8 @@
 #include <optional>
 #include <string_view>
 
+#include "host/media/colour_model.h"
+
 namespace calmframe::media {
 namespace {
 
@@ -207,8 +209,7 @@ ClipInfo InfoOf(const std::string& path, const Decoder& decoder, std::vector<Fra
         layout->flags & AV_PIX_FMT_FLAG_PAL ? 8 : std::clamp(layout->comp[0].depth, 8, 16);
     info.has_alpha = (layout->flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
   }
-  info.colour = {first.color_primaries, first.color_trc, first.colorspace, first.color_range,
-                 first.chroma_location};
+  info.colour = TagsOf(first);
   return info;
 }
 

@@ -98,15 +98,14 @@ bool IsSound(const ClipInfo& info) {
   const auto is_ratio = [](const Ratio& ratio) {
     return IsWithin(ratio.num, 1, INT32_MAX) && IsWithin(ratio.den, 1, INT32_MAX);
   };
-  constexpr int kMostTag = 255;
   return info.width >= 1 && info.height >= 1 &&
          std::int64_t{info.width} * info.height <= kMaximumPixels && is_ratio(info.pixel_aspect) &&
          is_ratio(info.frame_rate) && is_ratio(info.time_base) && IsWithin(info.bit_depth, 8, 16) &&
          IsWithin(info.rotation, 0, 270) && info.rotation % 90 == 0 &&
-         IsWithin(info.colour.primaries, 0, kMostTag) &&
-         IsWithin(info.colour.transfer, 0, kMostTag) && IsWithin(info.colour.matrix, 0, kMostTag) &&
-         IsWithin(info.colour.range, 0, 2) && IsWithin(info.colour.chroma_location, 0, 6) &&
-         info.stream >= 0;
+         IsWithin(info.colour.primaries, 0, AVCOL_PRI_NB - 1) &&
+         IsWithin(info.colour.transfer, 0, AVCOL_TRC_NB - 1) &&
+         IsWithin(info.colour.matrix, 0, AVCOL_SPC_NB - 1) && IsWithin(info.colour.range, 0, 2) &&
+         IsWithin(info.colour.chroma_location, 0, 6) && info.stream >= 0;
 }
 
 // Times by their steps, those of the index, which may be anything, by how they differ from them

@@ -275,9 +275,8 @@ void Scaler::ScalePart(const AVFrame& from, AVFrame& to, const ColourModel& mode
 template <class Pixel>
 void FrameToPixels::ConvertStored(const AVFrame& frame, Pixel* pixels, std::ptrdiff_t row_bytes) {
   const AVPixFmtDescriptor& layout = LayoutOf(frame);
-  ColourModel model = ModelOf({frame.color_primaries, frame.color_trc, frame.colorspace,
-                               frame.color_range, frame.chroma_location},
-                              static_cast<AVPixelFormat>(frame.format), info_.width, info_.height);
+  ColourModel model =
+      ModelOf(TagsOf(frame), static_cast<AVPixelFormat>(frame.format), info_.width, info_.height);
   model.fields = frame.interlaced_frame != 0;
   const bool alpha = (layout.flags & AV_PIX_FMT_FLAG_ALPHA) != 0;
   if (!IsYuv(layout)) {

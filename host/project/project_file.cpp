@@ -115,7 +115,8 @@ Project LoadProject(const std::string& path, std::size_t most) try {
   Fail(path, error);
 }
 
-std::string FindClip(const std::string& path, const Project& project) {
+std::string FindClip(const std::string& path, const Project& project,
+                     const std::function<bool(const std::string&)>& admits) {
   const fs::path folder = fs::absolute(path).parent_path();
   std::vector<fs::path> places;
   if (!project.clip_relative.empty()) {
@@ -127,6 +128,7 @@ std::string FindClip(const std::string& path, const Project& project) {
   for (const fs::path& place : places) {
     std::error_code error;
     if (!fs::is_regular_file(place, error) && !media::IsSequence(place)) continue;
+    if (admits && !admits(place)) continue;
     if (ContentOf(place) == project.clip_content) return place;
     if (changed.empty()) changed = place;
   }

@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <stdexcept>
 #include <string>
@@ -91,7 +92,9 @@ void CreateWithoutWork(const std::string& path);
 Project LoadProject(const std::string& path, std::size_t most = kMaximumInstanceBytes);
 
 // Where the project's clip lies now: at its place relative to the project, at its old place, or
-// beside the project. Throws ProjectFailure when it is nowhere, or is another clip by now.
-std::string FindClip(const std::string& path, const Project& project);
+// beside the project. Of what `admits` refuses nothing is read, as if it were not there. Throws
+// ProjectFailure when it is nowhere, or is another clip by now.
+std::string FindClip(const std::string& path, const Project& project,
+                     const std::function<bool(const std::string&)>& admits = {});
 
 }  // namespace calmframe::host

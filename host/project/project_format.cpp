@@ -199,6 +199,7 @@ Guid ChecksumOf(const Project& project, std::int64_t version) {
 
 std::int64_t CheckedVersion(const std::string& path, SqliteDatabase& database) {
   if (database.Number("PRAGMA application_id") != kApplicationId) Fail(path, "is no project");
+  database.ExpectPlainTables();
   const std::int64_t version = database.Number("PRAGMA user_version");
   if (version > kProjectVersion) Fail(path, "was saved by a newer version of the program");
   return version;

@@ -44,7 +44,8 @@ tessel::utility::Guid ChecksumOf(const Project& project, const ClipPlaces& place
 // As a file of that version has it.
 tessel::utility::Guid ChecksumOf(const Project& project, std::int64_t version);
 
-// Throws ProjectFailure where it is no project, or of a newer version.
+// Throws ProjectFailure where it is no project, or of a newer version, and SqliteError where its
+// tables are no plain ones.
 std::int64_t CheckedVersion(const std::string& path, SqliteDatabase& database);
 // Of an open file. Throws SqliteError where it has none.
 tessel::utility::Guid SavedChecksum(SqliteDatabase& database);

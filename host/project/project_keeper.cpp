@@ -65,6 +65,7 @@ const std::vector<std::uint8_t>* ProjectKeeper::Find(std::size_t number) noexcep
   if (!std::filesystem::exists(path_)) return nullptr;
   SqliteDatabase database(path_, SQLITE_OPEN_READWRITE);
   if (!HasTable(database, "analysis")) return nullptr;
+  database.ExpectPlainTables();
   SqliteStatement piece(database,
                         "SELECT bytes FROM analysis WHERE start_frame = ? AND number = ?");
   piece.Bind(1, start_frame_);

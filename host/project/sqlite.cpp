@@ -20,6 +20,11 @@ SqliteDatabase::SqliteDatabase(const std::string& path, int flags) {
     throw error;
   }
   sqlite3_busy_timeout(database_, kBusyMilliseconds);
+  for (const int off : {SQLITE_DBCONFIG_ENABLE_VIEW, SQLITE_DBCONFIG_ENABLE_TRIGGER,
+                        SQLITE_DBCONFIG_TRUSTED_SCHEMA}) {
+    sqlite3_db_config(database_, off, 0, nullptr);
+  }
+  sqlite3_db_config(database_, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);
 }
 
 SqliteDatabase::~SqliteDatabase() {
@@ -33,6 +38,16 @@ void SqliteDatabase::Run(const char* sql) {
 std::int64_t SqliteDatabase::Number(const char* sql) {
   SqliteStatement statement(*this, sql);
   return statement.Step() ? statement.Integer(0) : 0;
+}
+
+void SqliteDatabase::ExpectPlainTables() {
+  constexpr const char* kOthers[] = {
+      "SELECT count(*) FROM sqlite_master WHERE type NOT IN ('table', 'index') OR rootpage = 0",
+      "SELECT count(*) FROM sqlite_master AS own, pragma_table_xinfo(own.name) AS field"
+      " WHERE field.hidden <> 0"};
+  for (const char* const others : kOthers) {
+    if (Number(others) != 0) throw SqliteError(SQLITE_CORRUPT, "tables");
+  }
 }
 
 SqliteStatement::SqliteStatement(SqliteDatabase& database, const char* sql) : database_(database) {

@@ -32,6 +32,7 @@ Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
     : context_(context),
       roots_(settings.roots),
       folder_(settings.folder),
+      work_folder_(settings.WorkFolder()),
       surroundings_{context,
                     ending_,
                     roots_.folders(),
@@ -41,7 +42,7 @@ Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
       keep_(context) {
   surroundings_.worker_words.insert(surroundings_.worker_words.end(), settings.worker.begin(),
                                     settings.worker.end());
-  fs::create_directories(folder_);
+  fs::create_directories(work_folder_);
   chmod(folder_.c_str(), 0700);  // the secret is in it
   lock_ = std::make_unique<batch::FileLock>(folder_ + "/lock");
   if (!lock_->is_held()) {
@@ -49,7 +50,7 @@ Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
                              ": another studio keeps its work there; --session names another one");
   }
   renders_ = std::make_unique<RenderQueue>(
-      context, settings.program, folder_,
+      context, settings.program, work_folder_,
       [this](const std::string& id, const std::string& path, const auto& done) {
         Clip* const clip = Find(id);
         if (!clip) return done("the clip was removed", {});

@@ -26,6 +26,8 @@ struct StudioSettings {
   std::vector<std::string> worker;  // words behind it that make it a worker; see WorkerProcess
   std::vector<std::string> roots;
   std::string folder;  // where clips, choices and work are kept; made where it isn't there
+  // The part of it that workers and renders need: the rest has the secret.
+  std::string WorkFolder() const { return folder + "/work"; }
 };
 
 // What a person works on: clips and renders, as every window of theirs sees them. On the context's
@@ -80,11 +82,11 @@ class Studio {
   // True where it is on the disk.
   bool Keep();
   void KeepSoon();
-  std::string KeepPath(const std::string& id) const { return folder_ + "/" + id + ".calm"; }
+  std::string KeepPath(const std::string& id) const { return work_folder_ + "/" + id + ".calm"; }
 
   boost::asio::io_context& context_;
   const Roots roots_;
-  const std::string folder_;
+  const std::string folder_, work_folder_;
   std::unique_ptr<batch::FileLock> lock_;
   std::string secret_;
   EndingThreads ending_;

@@ -1,6 +1,9 @@
 #include "studio/wire/message.h"
 
 #include <cstdint>
+#include <string_view>
+
+#include "host/base/json_depth.h"
 
 namespace calmframe::studio {
 namespace {
@@ -40,6 +43,9 @@ std::optional<Message> MessageReader::Next() {
   const std::size_t head = SizeAt(pending_, 0), bytes = SizeAt(pending_, 4);
   if (head > kMostHead || bytes > kMostBytes) throw BadMessage("a message is too large");
   if (pending_.size() < kPrefix + head + bytes) return {};
+  if (NestsTooDeep(std::string_view(pending_).substr(kPrefix, head))) {
+    throw BadMessage("a message is nested too deep");
+  }
   const auto begin = pending_.begin() + kPrefix;
   Message message;
   message.head = nlohmann::json::parse(begin, begin + static_cast<std::ptrdiff_t>(head), nullptr,

@@ -92,8 +92,26 @@ void ClipDesk::OpenAnew(host::Opening opening) {
   }
   const host::Project project = host::LoadProject(opened_.project);
   std::string clip = opened_.clip;
-  if (clip.empty()) clip = host::FindClip(opened_.project, project);
-  Roots(opened_.roots).ExistingClip(clip);
+  const Roots roots(opened_.roots);
+  if (clip.empty()) {
+    std::string outside;
+    const auto admits = [&](const std::string& place) {
+      try {
+        roots.ExistingClip(place);
+        return true;
+      } catch (const PathRefused&) {
+        outside = place;
+        return false;
+      }
+    };
+    try {
+      clip = host::FindClip(opened_.project, project, admits);
+    } catch (const host::ProjectFailure&) {
+      if (!outside.empty()) roots.ExistingClip(outside);
+      throw;
+    }
+  }
+  roots.ExistingClip(clip);
   if (host::ContentOf(clip) != project.clip_content) {
     if (opened_.project != opened_.keep) {
       throw host::ProjectFailure(opened_.project + ": is of another clip, " + project.clip_path);

@@ -40,7 +40,9 @@ TEST(LibraryMisuseTest, OptionsThatThereAreNot) {
       {"planar formats", [](auto& o) { o.format = CALMFRAME_YUV420P, o.depth = 32; }},
       {"chroma samples", [](auto& o) { o.format = CALMFRAME_YUV420P, o.height = 121; }},
       {"frame_count is 0", [](auto& o) { o.frame_count = 0; }},
+      {"frame_count is 10000001", [](auto& o) { o.frame_count = 10'000'001; }},
       {"frame rate", [](auto& o) { o.rate_den = 0; }},
+      {"matrix 99", [](auto& o) { o.matrix = 99; }},
       {"aspect", [](auto& o) { o.aspect_num = -1; }},
       {"field order", [](auto& o) { o.field_order = 3; }},
       {"where frames are fetched", [](auto& o) { o.shots = CALMFRAME_SHOTS_FOUND; }},
@@ -67,6 +69,10 @@ TEST(LibraryMisuseTest, OptionsThatThereAreNot) {
   EXPECT_EQ(calmframe_open(&options, &session), CALMFRAME_ERROR_SOURCE);
   EXPECT_EQ(calmframe_open(nullptr, &session), CALMFRAME_ERROR_ARGUMENT);
   EXPECT_EQ(calmframe_open(&options, nullptr), CALMFRAME_ERROR_ARGUMENT);
+  options = street.Options();
+  options.width = options.height = 20;
+  options.frame_count = 10'000'000;
+  const Opened least(options);
   const Opened after(street.Options());  // none of these left anything open
 }
 

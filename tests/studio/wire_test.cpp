@@ -27,7 +27,9 @@ TEST(StudioWireTest, MessagesComeInAnyPieces) {
 TEST(StudioWireTest, RefusesWhatIsNoMessageBeforeItIsThere) {
   for (const std::string& stream :
        {std::string("\xff\xff\xff\xff\0\0\0\0", 8), std::string("\2\0\0\0\xff\xff\xff\xff{}", 10),
-        std::string("\2\0\0\0\0\0\0\0[]", 10), std::string("\2\0\0\0\0\0\0\0{x", 10)}) {
+        std::string("\2\0\0\0\0\0\0\0[]", 10), std::string("\2\0\0\0\0\0\0\0{x", 10),
+        std::string("\x46\x0d\x03\0\0\0\0\0{\"a\":", 13) + std::string(100000, '[') +
+            std::string(100000, ']') + '}'}) {
     MessageReader reader;
     reader.Add(stream.data(), stream.size());
     EXPECT_THROW(reader.Next(), BadMessage);

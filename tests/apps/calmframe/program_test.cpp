@@ -696,7 +696,7 @@ TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
       {"rendering", "render --project p.calm out.mp4", "TERM", "kept: p.calm; no other output"}};
   for (const auto& c : cases) {
     const Outcome outcome = Run(std::string(c.run) + " 2>log & until grep -qs " + c.stage +
-                                " log; do :; done; kill -" + c.signal + " $!; wait $!");
+                                " log; do sleep 0.01; done; kill -" + c.signal + " $!; wait $!");
     EXPECT_EQ(outcome.code, 130) << c.stage;
     EXPECT_THAT(Content("log"), HasSubstr("\ncalmframe: interrupted; " + std::string(c.left)));
     EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "log", "p.calm"));
@@ -705,7 +705,7 @@ TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
   // Nobody writes; the reader sleeps nowhere else once it is there.
   const Outcome waiting =
       Run("stabilize pipe out.mp4 & exec 3>pipe; "
-          "until grep -q 'State:.S' /proc/$!/status; do :; done; kill -INT $!; wait $!",
+          "until grep -q 'State:.S' /proc/$!/status; do sleep 0.01; done; kill -INT $!; wait $!",
           "mkfifo pipe; TMPDIR=. ");
   EXPECT_EQ(waiting.code, 130);
   ExpectOneLine(waiting, "interrupted; no output was left");
@@ -714,7 +714,7 @@ TEST_F(ProgramTest, InterruptLeavesNothingBehind) {
 
 TEST_F(ProgramTest, WhatAKilledRunLeftIsSweptAndWhatARunningOneWritesIsNot) {
   MakeClip("in.mp4", 160, 120, 60);
-  const std::string rendering = " 2>log & until grep -qs rendering log; do :; done; ";
+  const std::string rendering = " 2>log & until grep -qs rendering log; do sleep 0.01; done; ";
   const std::string flags = " --synthesis-input-range 2 --framing synthesize-edges";
   const std::string run = "stabilize in.mp4 out.mp4" + flags;
   for (const std::string out : {"out.mp4", "out%d.png"}) {  // a file, a folder

@@ -100,6 +100,17 @@ TEST_F(BatchPlanTest, ClipsAreFound) {
   EXPECT_THAT(Found({"@" + In("list")}, false),
               ElementsAre("c/a.mov", "c/sub/d.mkv", "./@list: No such file or directory",
                           "no.mp4: No such file or directory"));
+  // What a list may ask for ends: of two words ten are a thousand names, of folders that go round
+  // and round there is one after the other.
+  std::string spelled = In("c/"), round = In("c/");
+  for (int word = 0; word < 30; ++word) spelled += "{a,b}";
+  for (int turn = 0; turn < 30; ++turn) round += "*/../";
+  Make("c/a/x.mp4");
+  Make("c/b/x.mp4");
+  MakeFile("hard", spelled + "*\n" + round + "*.mp4\n" + In("c/{a,b}/x*"));
+  EXPECT_THAT(Found({"@" + In("hard")}, false),
+              ElementsAre(HasSubstr("}*: no file has such a name"),
+                          HasSubstr("*.mp4: no file has such a name"), "c/a/x.mp4", "c/b/x.mp4"));
   MakeFile("list0", In("line\nbreak.mp4") + std::string(1, '\0') + In("@at.mp4"));
   EXPECT_THAT(Found({"@" + In("list0")}, false), ElementsAre("line\nbreak.mp4", "@at.mp4"));
   std::filesystem::create_directory(In("none"));
@@ -189,6 +200,16 @@ TEST_F(BatchPlanTest, WhatIsDoneIsDoneUntilAnythingChanges) {
   for (std::size_t size = 0; size + 2 < text.size(); ++size) {
     ASSERT_TRUE(WriteWhole(path, text.substr(0, size)));
     ASSERT_FALSE(ReadRecord(path)) << size;
+  }
+  std::string lost = text;
+  lost.replace(lost.find("done"), 4, "lost");
+  ASSERT_TRUE(WriteWhole(path, lost));
+  EXPECT_FALSE(ReadRecord(path)) << "of a state that there is not";
+  for (const std::size_t depth : {98, 99, 100000}) {  // in two objects
+    std::string nested = text;
+    nested.replace(nested.find("1.25"), 4, std::string(depth, '[') + std::string(depth, ']'));
+    ASSERT_TRUE(WriteWhole(path, nested));
+    EXPECT_EQ(ReadRecord(path).has_value(), depth < 99) << depth;
   }
   SaveRecord(plan, whole);
   std::filesystem::remove(plan.OutputOf(task));

@@ -2,9 +2,11 @@
 // decodes from it.
 
 #include <cmath>
+#include <cstring>
 #include <iterator>
 #include <sstream>
 
+#include "host/media/colour_model.h"
 #include "host/media/frame_index.h"
 #include "tests/host/media/clip_fixture.h"
 
@@ -184,6 +186,20 @@ TEST_F(UnusualMediaTest, TimesBeyondAnyClockAreNone) {
     // A 25th of a second.
     for (std::size_t i = 1; i < 5; ++i) EXPECT_EQ(info.times[i].pts - info.times[i - 1].pts, 2048);
     EXPECT_LT(std::abs(info.times[4].pts), std::int64_t{1} << 61);
+  }
+}
+
+// An MPEG-4 header tells eight bits, and FFmpeg hands them on.
+TEST_F(UnusualMediaTest, ColoursThatThereAreNotAreNotTold) {
+  const FramePtr frame = NewFrame();
+  const ColourTags silent = TagsOf(*frame);
+  for (const int known : {1, 206}) {
+    std::memcpy(&frame->color_primaries, &known, sizeof known);
+    std::memcpy(&frame->color_trc, &known, sizeof known);
+    std::memcpy(&frame->colorspace, &known, sizeof known);
+    std::memcpy(&frame->color_range, &known, sizeof known);
+    std::memcpy(&frame->chroma_location, &known, sizeof known);
+    EXPECT_EQ(TagsOf(*frame), known == 1 ? (ColourTags{1, 1, 1, 1, 1}) : silent);
   }
 }
 

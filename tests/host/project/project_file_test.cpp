@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <tuple>
 
+#include "host/project/project_keeper.h"
 #include "host/project/sqlite.h"
 #include "host/timeline/source.h"
 #include "tests/support/scratch_folder.h"
@@ -83,6 +84,8 @@ TEST_F(ProjectTest, TheClipIsFoundBesideAProjectThatMovedOrWhereItWas) {
   EXPECT_EQ(FindClip(path, project), In("moved/walk.mp4"));
   fs::rename(In("moved/walk.mp4"), In("moved/clips/walk.mp4"));
   EXPECT_EQ(FindClip(path, project), In("moved/clips/walk.mp4"));
+  const auto admits = [&](const std::string& place) { return place == In("clips/walk.mp4"); };
+  EXPECT_THAT([&] { FindClip(path, project, admits); }, IsRefused("clips/walk.mp4: is not the"));
   fs::remove(In("moved/clips/walk.mp4"));
   EXPECT_THAT([&] { FindClip(path, project); }, IsRefused("clips/walk.mp4: is not the clip"));
   fs::remove(In("clips/walk.mp4"));
@@ -175,6 +178,27 @@ TEST_F(ProjectTest, DamageIsToldAndNeverMore) {
       } catch (const ProjectFailure&) {
       }
     }
+  }
+}
+
+TEST_F(ProjectTest, TablesThatComputeWhatTheyHoldAreDamage) {
+  for (const char* const sql :
+       {"DROP TABLE frames; CREATE VIEW frames AS WITH RECURSIVE n (bytes) AS"
+        " (SELECT 1 UNION ALL SELECT bytes + 1 FROM n) SELECT count(*) AS bytes FROM n",
+        "ALTER TABLE shot ADD COLUMN more AS (hex(zeroblob(400000000)))",
+        "CREATE VIRTUAL TABLE more USING rtree (a, b, c)",
+        "CREATE TRIGGER more AFTER INSERT ON shot BEGIN SELECT 1; END"}) {
+    SCOPED_TRACE(sql);
+    const std::string path = In("computed.calm");
+    std::filesystem::remove(path);
+    SaveProject(path, Sample(1, 10));
+    sqlite3* stranger = nullptr;
+    ASSERT_EQ(sqlite3_open(path.c_str(), &stranger), SQLITE_OK);
+    EXPECT_EQ(sqlite3_exec(stranger, sql, nullptr, nullptr, nullptr), SQLITE_OK);
+    sqlite3_close(stranger);
+    EXPECT_THAT([&] { LoadProject(path); }, IsRefused("is damaged"));
+    EXPECT_THAT([&] { SaveProject(path, Sample(1, 10)); }, IsRefused("is damaged"));
+    EXPECT_EQ(ProjectKeeper(path, 0).Find(0), nullptr);
   }
 }
 

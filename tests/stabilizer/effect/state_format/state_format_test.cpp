@@ -210,6 +210,25 @@ TEST(StateFormatTest, TextsThatAreAJob) {
   const auto wrap = [](std::string& job) { job = "{\"SerializerWrappedObject\":" + job + "}"; };
   EXPECT_TRUE(Read(WithJob(wrap), 16, true).job);
 
+  for (const std::size_t units : {65536, 65537}) {
+    const std::string padded =
+        WithJob([units](std::string& job) { job.append(units - job.size(), ' '); });
+    if (units == 65536) {
+      EXPECT_TRUE(Read(padded, 16, true).job);
+    } else {
+      EXPECT_EQ(Refused(padded, 16, true).reason, StateRefused::Reason::Damaged);
+    }
+  }
+  for (const auto& [from, to] : {std::pair{R"("half_winx":5)", R"("half_winx":200)"},
+                                 {R"("max_iterations":25)", R"("max_iterations":100)"},
+                                 {R"("pyramidal_levels":5)", R"("pyramidal_levels":10)"},
+                                 {R"("half_win_x":7)", R"("half_win_x":50)"}}) {
+    const auto change = [from = std::string(from), to = to](std::string& job) {
+      job.replace(job.find(from), from.size(), to);
+    };
+    EXPECT_TRUE(Read(WithJob(change), 16, true).job) << to;
+  }
+
   constexpr char kAll[] = "";
   for (const auto& [from, to] :
        {std::pair{kAll, ""},
