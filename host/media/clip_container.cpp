@@ -11,6 +11,15 @@
 #include "host/media/output_choice.h"
 
 namespace calmframe::media {
+namespace {
+
+// MP4 and its relatives, by what their muxer knows.
+bool IsIsobmff(const AVFormatContext& container) {
+  return container.oformat->priv_class &&
+         av_opt_find(container.priv_data, "movflags", nullptr, 0, 0) != nullptr;
+}
+
+}  // namespace
 
 void ClipContainer::Delete::operator()(AVFormatContext* container) const {
   if (container->pb) avio_closep(&container->pb);
@@ -103,7 +112,7 @@ void ClipContainer::Begin(const Video& video, const ClipInfo& source,
   }
   AVDictionary* options = nullptr;
   // Whoever plays a file while it is on its way needs the index in front.
-  if (format_->priv_class && av_opt_find(container->priv_data, "movflags", nullptr, 0, 0)) {
+  if (IsIsobmff(*container)) {
     av_dict_set(&options, "movflags", "+faststart", 0);
   }
   // The source's clock, kept as it is.
@@ -160,8 +169,24 @@ void ClipContainer::Finish() {
     Check(error);
     Check(closed);
   }
-  if (file_) file_->Commit();
+  if (file_) {
+    CheckIndex();
+    file_->Commit();
+  }
   if (pictures_) pictures_->Commit();
+}
+
+// The muxer of MP4 goes on, and tells nothing, where a part of the index finds no memory.
+void ClipContainer::CheckIndex() const {
+  if (!IsIsobmff(*container_)) return;
+  AVFormatContext* opened = nullptr;
+  avformat_open_input(&opened, file_->temporary().c_str(), nullptr, nullptr);
+  const InputPtr written(opened);
+  const auto frames = [](const AVFormatContext& container) {
+    const AVStream* const first = container.nb_streams > 0 ? container.streams[0] : nullptr;
+    return first && first->codecpar->codec_type == AVMEDIA_TYPE_VIDEO ? first->nb_frames : -1;
+  };
+  if (!written || frames(*written) != frames(*container_)) Fail("can't be written: no whole index");
 }
 
 void ClipContainer::Fail(const std::string& cause) const {

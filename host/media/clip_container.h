@@ -53,6 +53,7 @@ class ClipContainer {
   static int CloseAndKeepError(AVFormatContext* container, AVIOContext* file);
   void WriteHeader();
   void CopyUntilCommon(std::int64_t time);
+  void CheckIndex() const;
 
   const std::string shown_;
   const bool to_pipe_;
