@@ -36,7 +36,7 @@ struct Failed {
 struct Stopped {};
 
 // What a flag sets: its name, of --param the parameter's too.
-std::set<std::string> NamesIn(const std::vector<std::string>& settings) {
+std::set<std::string> FlagsOf(const std::vector<std::string>& settings) {
   std::set<std::string> names;
   for (const std::string& word : settings) {
     const std::size_t name = word.starts_with("--param=") ? word.find('=') + 1 : 0;
@@ -48,7 +48,7 @@ std::set<std::string> NamesIn(const std::vector<std::string>& settings) {
 // A project keeps the controls that it was made with, so one of flags that are no longer given
 // would set them still.
 bool SetsAllOf(const std::vector<std::string>& settings, const std::vector<std::string>& before) {
-  const auto now = NamesIn(settings), then = NamesIn(before);
+  const auto now = FlagsOf(settings), then = FlagsOf(before);
   return std::includes(now.begin(), now.end(), then.begin(), then.end());
 }
 

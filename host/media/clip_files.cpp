@@ -142,7 +142,7 @@ ClipFiles Globbed(const std::string& shown, const std::string& pattern) {
   return files;
 }
 
-std::vector<std::string> NamesIn(const std::string& folder, const std::string& shown) {
+std::vector<std::string> PicturesIn(const std::string& folder, const std::string& shown) {
   std::vector<std::string> names;
   std::error_code error;
   for (fs::directory_iterator entry(folder, error), end; !error && entry != end;
@@ -161,7 +161,7 @@ bool IsPictureExtension(const std::string& extension) {
 
 ClipFiles InFolder(const std::string& shown) {
   std::map<std::string, int> extensions;
-  for (const std::string& name : NamesIn(shown, shown)) {
+  for (const std::string& name : PicturesIn(shown, shown)) {
     const std::string extension = fs::path(name).extension();
     if (name[0] != '.' && IsPictureExtension(extension)) ++extensions[extension];
   }
@@ -181,7 +181,7 @@ ClipFiles Numbered(const std::string& shown, NumberedPath path) {
   const auto most_digits = static_cast<std::size_t>(std::max(9, path.digits));
   path.folder = fs::absolute(shown).parent_path().string() + '/';
   std::vector<int> numbers;
-  for (const std::string& name : NamesIn(path.folder, shown)) {
+  for (const std::string& name : PicturesIn(path.folder, shown)) {
     const std::size_t around = path.before.size() + path.after.size();
     if (name.size() <= around || name.size() > around + most_digits) continue;
     const int number = std::atoi(name.c_str() + path.before.size());
