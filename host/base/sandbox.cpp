@@ -249,6 +249,16 @@ Sandbox::Bounds Sandbox::Enter() const {
         const fs::path base = named ? fs::path(named) : fs::path(home) / fonts.otherwise;
         if (base.is_absolute()) Allow(ruleset.get(), base / fonts.folder, kReadRights, handled);
       }
+#ifdef __SANITIZE_ADDRESS__
+      // Which leaks it shall not tell of is read as the process ends.
+      const std::string options = std::getenv("LSAN_OPTIONS") ? std::getenv("LSAN_OPTIONS") : "";
+      constexpr std::string_view kFile = "suppressions=";
+      if (const std::size_t at = options.find(kFile); at != std::string::npos) {
+        const std::size_t from = at + kFile.size();
+        Allow(ruleset.get(), options.substr(from, options.find(':', from) - from), kReadRights,
+              handled);
+      }
+#endif
       for (const std::string& path : read_) Allow(ruleset.get(), path, kReadRights, handled);
       for (const std::string& path : written_) Allow(ruleset.get(), path, kOfFiles, handled);
       for (const std::string& path : folders_) Allow(ruleset.get(), path, kWriteRights, handled);
