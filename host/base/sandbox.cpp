@@ -198,9 +198,9 @@ bool BoundCalls() {
     seccomp_rule_add(filter.get(), SCMP_ACT_ERRNO(EACCES), call, 0);
   }
   // Signals to itself alone.
-  const auto self = static_cast<scmp_datum_t>(getpid());
+  const scmp_arg_cmp others{0, SCMP_CMP_NE, static_cast<scmp_datum_t>(getpid()), 0};
   for (const int call : {SCMP_SYS(kill), SCMP_SYS(tgkill)}) {
-    seccomp_rule_add(filter.get(), SCMP_ACT_ERRNO(EACCES), call, 1, SCMP_A0_32(SCMP_CMP_NE, self));
+    seccomp_rule_add_array(filter.get(), SCMP_ACT_ERRNO(EACCES), call, 1, &others);
   }
   seccomp_attr_set(filter.get(), SCMP_FLTATR_CTL_TSYNC, 1);
   return seccomp_load(filter.get()) == 0;
