@@ -38,10 +38,10 @@ FrameDigest::Area FrameHistory::SteadyArea(const FrameDigest::Area& last) const 
                      [edge](const auto& a, const auto& b) { return a.*edge < b.*edge; });
     return *middle.*edge;
   };
-  using Area = FrameDigest::Area;
-  const Area area{median(&Area::left), median(&Area::top), median(&Area::right),
-                  median(&Area::bottom)};
-  return area.IsEmpty() ? Area{} : area;
+  using Sides = FrameDigest::Area;
+  const Sides area{median(&Sides::left), median(&Sides::top), median(&Sides::right),
+                   median(&Sides::bottom)};
+  return area.IsEmpty() ? Sides{} : area;
 }
 
 void FrameHistory::Add(const FrameDigest& digest) {

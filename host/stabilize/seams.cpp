@@ -7,14 +7,14 @@
 namespace calmframe::host {
 
 Seams::Seams(const WarpedPlane& plane) : plane_(plane), begins_(plane.clip().statuses.size(), -1) {
-  constexpr std::int32_t kDeletedBegins = -10, kDeletedGoesOn = -11;
+  constexpr std::int32_t kBeginsDeleted = -10, kGoesOnDeleted = -11;
   const SolvedClip& clip = plane.clip();
   const auto slots = static_cast<std::size_t>(clip.slots);
   for (std::size_t i = 0; i < begins_.size(); ++i) {
     const std::int32_t status = clip.statuses[i];
-    if (status > 0 || status == kDeletedBegins) {
+    if (status > 0 || status == kBeginsDeleted) {
       begins_[i] = static_cast<std::int32_t>(i / slots);
-    } else if ((status == 0 || status == kDeletedGoesOn) && i >= slots) {
+    } else if ((status == 0 || status == kGoesOnDeleted) && i >= slots) {
       begins_[i] = begins_[i - slots];
     }
   }
