@@ -48,7 +48,7 @@ std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& con
       batch::Child child(words, theirs);
       close(theirs);
       using Clock = std::chrono::steady_clock;
-      constexpr std::chrono::seconds kPatience(4);
+      constexpr std::chrono::seconds kUntilAsked(4);
       Clock::time_point closed_at = Clock::time_point::max();
       std::string line;
       while (true) {
@@ -57,7 +57,7 @@ std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& con
         if (what == batch::Child::Said::line) said = line;
         if (!*closed) continue;
         if (closed_at == Clock::time_point::max()) closed_at = Clock::now();
-        if (Clock::now() - closed_at > kPatience) child.AskToEnd();
+        if (Clock::now() - closed_at > kUntilAsked) child.AskToEnd();
       }
       code = child.Wait();
     } catch (const std::exception& error) {
