@@ -12,6 +12,7 @@
 #include <system_error>
 #include <utility>
 
+#include "host/base/json_depth.h"
 #include "host/batch/child.h"
 #include "host/media/clip.h"
 #include "host/media/glance.h"
@@ -40,8 +41,27 @@ void Expect(const media::Glance& clip, Task& task) {
   task.memory = ExpectedMemory(clip.width, clip.height, frames);
 }
 
+// What a process says of a clip. It reads what strangers made, so it isn't believed all.
+void Take(const nlohmann::ordered_json& json, Task& task) try {
+  if (json.contains("refused")) {
+    // Its name as it was asked for stands before all that is told of it.
+    const std::string why = BytesOf(json["refused"]), begin = task.source + ": ";
+    Refuse(task, Shown(why.starts_with(begin) ? why.substr(begin.size()) : why), kInputCode);
+    return;
+  }
+  const media::Glance clip{json.value("width", 0), json.value("height", 0),
+                           json.value("frames", 0.0)};
+  constexpr int kMostSide = 1 << 20;
+  constexpr double kMostFrames = 1e9;
+  if (clip.width > 0 && clip.width < kMostSide && clip.height > 0 && clip.height < kMostSide &&
+      clip.frames < kMostFrames) {
+    Expect(clip, task);
+  }
+} catch (const nlohmann::json::exception&) {  // of another shape: it stays unknown
+}
+
 // Clips that one process looks at: its start takes as long as some tens of them.
-constexpr std::size_t kFewAPart = 32, kMostAPart = 512;
+constexpr std::size_t kFewAPart = 32, kMostAPart = 256;
 
 // Takes what a process of its own says of the clips, a line each: how many it came to.
 std::size_t Glances(const std::string& program, const std::vector<Task*>& tasks,
@@ -56,16 +76,10 @@ std::size_t Glances(const std::string& program, const std::vector<Task*>& tasks,
     const Child::Said said = child.Next(line, kPatience);
     if (said == Child::Said::end || stops()) break;
     if (said == Child::Said::nothing) continue;
+    if (NestsTooDeep(line)) continue;
     const auto json = nlohmann::ordered_json::parse(line, nullptr, false);
     if (!json.is_object()) continue;  // what a library says
-    Task& task = *tasks[done++];
-    if (json.contains("refused")) {
-      // Its name as it was asked for stands before all that is told of it.
-      const std::string why = BytesOf(json["refused"]), begin = task.source + ": ";
-      Refuse(task, Shown(why.starts_with(begin) ? why.substr(begin.size()) : why), kInputCode);
-    } else {
-      Expect({json.value("width", 0), json.value("height", 0), json.value("frames", 0.0)}, task);
-    }
+    Take(json, *tasks[done++]);
   }
   return done;
 } catch (const std::system_error&) {

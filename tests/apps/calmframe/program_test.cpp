@@ -272,8 +272,9 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
   MakeClip("in.mp4", 64, 48, 5);
   MakeFile("there.mp4", "precious");
   fs::create_symlink("in.mp4", Path("link.mp4"));
+  fs::create_symlink("ring.mp4", Path("ring.mp4"));
   for (const std::string output :
-       {"there.mp4", "in.mp4 --overwrite", "link.mp4 --overwrite", "out.unknown",
+       {"there.mp4", "in.mp4 --overwrite", "link.mp4 --overwrite", "ring.mp4", "out.unknown",
         "out.mp4 --codec nosuch", "out.mp4 --pixel-format nosuch"}) {
     ExpectLine("stabilize in.mp4 " + output, 4, "");
   }
@@ -285,7 +286,7 @@ TEST_F(ProgramTest, OutputThatMayNotBeWrittenCostsNoAnalysis) {
     ExpectLine("stabilize in.mp4 out.mp4 --codec h264_vaapi", 4, "h264_vaapi");
   }
   ExpectLine("stabilize in.mp4 no/such/folder.mp4", 4, "there is no folder no/such\n");
-  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "there.mp4"));
+  EXPECT_THAT(Files(), ::testing::ElementsAre("in.mp4", "link.mp4", "ring.mp4", "there.mp4"));
   EXPECT_EQ(Content("there.mp4"), "precious");
   RunWell("stabilize in.mp4 there.mp4 --overwrite --quiet");
   EXPECT_EQ(ClipReader::Open(Path("there.mp4"))->info().frame_count, 5u);
