@@ -82,7 +82,9 @@ struct Clip {
   }
 
   void Track(FeatureTracker& tracker, std::vector<tracking_feature<float>>& row) {
-    tracker.TrackAndVerify(previous, current, seeds.data(), row.data(), seeds.size(), statistics);
+    FeatureTracker::Workspace workspace = tracker.MakeWorkspace();
+    tracker.TrackAndVerify(previous, current, seeds.data(), row.data(), 0, seeds.size(), workspace,
+                           statistics);
   }
 
   std::size_t width, height;
