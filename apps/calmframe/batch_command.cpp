@@ -17,7 +17,6 @@
 #include "apps/calmframe/plugin_path.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/thumbnails.h"
-#include "apps/report/data_url.h"
 #include "host/batch/clip_names.h"
 #include "host/batch/clip_search.h"
 #include "host/batch/local_batch.h"
@@ -74,11 +73,10 @@ class ThumbnailSource {
     pixels_.resize(static_cast<std::size_t>(info_.width) * static_cast<std::size_t>(info_.height));
     reader->Read(std::min(shown, info_.frame_count - 1), pixels_.data(), row_bytes());
   }
-  report::PictureView view() const {
-    const media::Ratio& aspect = info_.pixel_aspect;
-    return {pixels_.data(), row_bytes(), info_.width, info_.height,
-            static_cast<double>(aspect.num) / static_cast<double>(aspect.den)};
+  media::PictureView view() const {
+    return {pixels_.data(), row_bytes(), info_.width, info_.height};
   }
+  const media::Ratio& pixel_aspect() const { return info_.pixel_aspect; }
 
  private:
   std::ptrdiff_t row_bytes() const {
@@ -341,7 +339,8 @@ BatchPicturesCommand::BatchPicturesCommand(CLI::App& program)
 void BatchPicturesCommand::Run() {
   Confinement{.read = {before_, after_}}.Begin();
   const ThumbnailSource before(before_), after(after_);
-  std::printf("%s\n", Thumbnails(before.view(), after.view()).dump().c_str());
+  std::printf("%s\n",
+              Thumbnails(before.view(), after.view(), before.pixel_aspect()).dump().c_str());
 }
 
 }  // namespace calmframe

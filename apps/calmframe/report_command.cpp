@@ -37,9 +37,9 @@ constexpr int kPictureWidth = 400;   // of the filmstrip, pixels
 constexpr std::size_t kMoments = 6;  // of the filmstrip
 constexpr int kMostDownsampled = 4;
 
-report::PictureView ViewOf(const host::WorldBuffer& pixels, double pixel_aspect) {
+media::PictureView ViewOf(const host::WorldBuffer& pixels) {
   return {pixels.row<HX_Pixel8>(0), pixels.world().row_bytes, pixels.world().width,
-          pixels.world().height, pixel_aspect};
+          pixels.world().height};
 }
 
 // Share of the picture that nothing was drawn on.
@@ -106,7 +106,7 @@ std::vector<double> Draw(host::SteadyClip& clip, int threads, ProgressLine& prog
                         empty.push_back(100 * EmptyShare(*drawn.pixels));
                         if (next < film.size() && frame == film[next].frame) {
                           film[next++].after =
-                              DataUrlOf(ViewOf(*drawn.pixels, aspect), kPictureWidth);
+                              report::DataUrlOf(ViewOf(*drawn.pixels), aspect, kPictureWidth);
                         }
                       });
   // From the source that has drawn the frames: another reader would search the file for them again.
@@ -116,7 +116,7 @@ std::vector<double> Draw(host::SteadyClip& clip, int threads, ProgressLine& prog
         static_cast<std::int64_t>(clip.range().first + moment.frame), host::PixelKind::argb8);
     if (!shot) continue;
     moment.before = report::DataUrlOf(
-        {shot->row<HX_Pixel8>(0), shot->row_bytes(), shot->width(), shot->height(), aspect},
+        {shot->row<HX_Pixel8>(0), shot->row_bytes(), shot->width(), shot->height()}, aspect,
         kPictureWidth);
   }
   return empty;

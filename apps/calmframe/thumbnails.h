@@ -4,8 +4,8 @@
 #include <nlohmann/json_fwd.hpp>
 #include <string>
 
-#include "apps/report/data_url.h"
 #include "host/media/clip.h"
+#include "host/media/jpeg.h"
 #include "platform/hx/hx_world.h"
 
 namespace calmframe {
@@ -14,10 +14,10 @@ namespace calmframe {
 // decoded soon.
 std::size_t ThumbnailFrame(std::size_t frames);
 
-// Small pictures, as data URLs, in an object for batch's page.
-nlohmann::ordered_json Thumbnails(const report::PictureView& before,
-                                  const report::PictureView& after);
-// The same of frames of any depth. pixel_aspect: of both.
+// Small pictures, as data URLs, in an object for batch's page. pixel_aspect: of both.
+nlohmann::ordered_json Thumbnails(const media::PictureView& before, const media::PictureView& after,
+                                  const media::Ratio& pixel_aspect);
+// The same of frames of any depth.
 nlohmann::ordered_json Thumbnails(const HX_World& before, const HX_World& after,
                                   const media::Ratio& pixel_aspect);
 

@@ -88,8 +88,12 @@ std::string JpegEncoder::Encode(const std::vector<PictureView>& pictures, int wi
     // The quick way leaves out pixels of what is made much smaller.
     state_->scaler.reset(NotNull(sws_getCachedContext(
         state_->scaler.release(), picture.width, picture.height, AV_PIX_FMT_ARGB, width, height,
-        AV_PIX_FMT_YUVJ420P, picture.width > 2 * width ? SWS_AREA : SWS_FAST_BILINEAR, nullptr,
+        AV_PIX_FMT_YUV420P, picture.width > 2 * width ? SWS_AREA : SWS_FAST_BILINEAR, nullptr,
         nullptr, nullptr)));
+    // As JFIF has it: BT.601 in full range.
+    const int* const bt601 = sws_getCoefficients(SWS_CS_ITU601);
+    constexpr int kFull = 1, kUnit = 1 << 16;
+    sws_setColorspaceDetails(state_->scaler.get(), bt601, kFull, bt601, kFull, 0, kUnit, kUnit);
     const std::uint8_t* const from[] = {reinterpret_cast<const std::uint8_t*>(picture.pixels)};
     const int from_rows[] = {static_cast<int>(picture.row_bytes)};
     std::uint8_t* to[3];
