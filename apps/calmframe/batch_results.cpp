@@ -39,10 +39,12 @@ std::string FigureOf(const batch::Record& record, const char* name, int digits) 
   return Fixed(figure->get<double>(), digits);
 }
 
-// Empty where a file, which others may have written, has none.
-std::string TextIn(const nlohmann::ordered_json& object, const char* name) {
-  const auto text = object.find(name);
-  return text != object.end() && text->is_string() ? text->get<std::string>() : "";
+// Of a file that others may have written: empty of what is no picture within the page.
+std::string PictureIn(const nlohmann::ordered_json& object, const char* name) {
+  const auto url = object.find(name);
+  if (url == object.end() || !url->is_string()) return "";
+  const auto text = url->get<std::string>();
+  return text.starts_with("data:image/") ? text : "";
 }
 
 // The columns of the table and of the page, behind the clip's name.
@@ -230,8 +232,8 @@ void BatchResults::WritePage() const {
       const auto pictures =
           n < kMostPictures ? batch::ReadObject(plan_.FolderOf(task).pictures()) : std::nullopt;
       if (pictures) {
-        told.before = TextIn(*pictures, "before");
-        told.after = TextIn(*pictures, "after");
+        told.before = PictureIn(*pictures, "before");
+        told.after = PictureIn(*pictures, "after");
       }
     }
     page.rows.push_back(std::move(told));
