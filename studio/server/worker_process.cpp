@@ -24,7 +24,6 @@ WorkerProcess::WorkerProcess(boost::asio::io_context& context, EndingThreads& en
 
 WorkerProcess::~WorkerProcess() {
   Close();
-  if (thread_.joinable()) ending_.threads.push_back(std::move(thread_));
 }
 
 std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& context,
@@ -69,9 +68,8 @@ std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& con
     boost::asio::post(context, [weak, code, said] {
       const std::shared_ptr<WorkerProcess> ended = weak.lock();
       if (!ended || ended->closed_) return;
-      ended->closed_ = true;
       const auto tell = ended->events_.end;
-      ended->events_ = {};
+      ended->Close();
       if (tell) tell(code, said);
     });
   });
@@ -89,6 +87,8 @@ void WorkerProcess::Close() {
   closed_ = true;
   events_ = {};
   HangUp(Process::end);
+  // What is still to be written may hold this until the context goes, after all else.
+  if (thread_.joinable()) ending_.threads.push_back(std::move(thread_));
 }
 
 void WorkerProcess::HangUp(Process is_to) {

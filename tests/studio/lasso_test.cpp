@@ -29,7 +29,8 @@ host::SolvedClip Tracked() {
 
 std::vector<TrackPoint> Points(const Lasso& lasso, int fields = 1) {
   std::vector<TrackPoint> points;
-  for (const LassoedTrack& track : TracksIn(lasso, Tracked(), fields)) points.push_back(track.point);
+  for (const LassoedTrack& track : TracksIn(lasso, Tracked(), fields))
+    points.push_back(track.point);
   return points;
 }
 
