@@ -14,11 +14,8 @@
 namespace calmframe::studio {
 namespace {
 
-using Clock = std::chrono::steady_clock;
-
 constexpr std::size_t kMostJobs = 200;
 constexpr std::size_t kMostNotes = 50;  // of a job
-constexpr std::chrono::seconds kUntilKilled(20);
 
 std::string Number(double value) {
   return nlohmann::json(value).dump();
@@ -167,6 +164,8 @@ void RenderQueue::Run(Job& job, const Settings& settings) {
     int code = 127;
     try {
       batch::Child child(words);
+      using Clock = std::chrono::steady_clock;
+      constexpr std::chrono::seconds kUntilKilled(20);
       std::string line;
       std::optional<Clock::time_point> stopped;
       while (true) {
