@@ -9,7 +9,7 @@
 
 namespace calmframe::fuzz {
 
-// A file in a folder of its own below $TMPDIR, which goes with the object.
+// A file in a folder of its own below $TMPDIR, which goes with the object, and what else is there.
 class ScratchFile {
  public:
   ScratchFile() {
@@ -24,6 +24,7 @@ class ScratchFile {
   ScratchFile(const ScratchFile&) = delete;
   ScratchFile& operator=(const ScratchFile&) = delete;
 
+  const std::string& folder() const { return folder_; }
   std::string path() const { return folder_ + "/file"; }
   void Write(const std::string& bytes) const {
     std::ofstream(path(), std::ios::binary | std::ios::trunc) << bytes;

@@ -3,8 +3,6 @@
 //
 // What a page knows is put into what is sent, so that what lies behind the doors is reached too.
 
-#include <unistd.h>
-
 #include <algorithm>
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/ip/tcp.hpp>
@@ -19,6 +17,7 @@
 #include <stdexcept>
 #include <string>
 
+#include "fuzz/scratch_file.h"
 #include "fuzz/studio_input.h"
 #include "studio/server/http_session.h"
 #include "studio/wire/message.h"
@@ -33,23 +32,18 @@ using boost::asio::ip::tcp;
 class Room {
  public:
   Room() {
-    std::string folder = std::filesystem::temp_directory_path() / "studio_fuzz.XXXXXX";
-    if (!mkdtemp(folder.data())) std::abort();
-    folder_ = folder;
-    std::filesystem::create_directory(folder_ + "/clips");
-    std::ofstream(folder_ + "/clips/walk.mp4");
+    std::filesystem::create_directory(clips_);
+    std::ofstream(clips_ + "/walk.mp4");
     studio_ = std::make_unique<Studio>(
-        context_, StudioSettings{"/bin/false", {}, {folder_ + "/clips"}, folder_ + "/session"});
+        context_, StudioSettings{"/bin/false", {}, {clips_}, scratch_.folder() + "/session"});
     doors_.cookie = "c";
-    clip_ = studio_->Add(folder_ + "/clips/walk.mp4");
+    clip_ = studio_->Add(clips_ + "/walk.mp4");
     acceptor_ = std::make_unique<tcp::acceptor>(
         context_, tcp::endpoint(boost::asio::ip::address_v4::loopback(), 0));
   }
   ~Room() {
     doors_.closed = true;
     studio_->StopAll();
-    std::error_code ignored;
-    std::filesystem::remove_all(folder_, ignored);
   }
 
   // False where the fuzzer's own signal came between.
@@ -99,7 +93,7 @@ class Room {
       } else if (c == kClip) {
         filled += clip_;
       } else if (c == kHere) {
-        filled += folder_ + "/clips";
+        filled += clips_;
       } else {
         filled += c;
       }
@@ -107,7 +101,9 @@ class Room {
     return filled;
   }
 
-  std::string folder_, clip_;
+  const calmframe::fuzz::ScratchFile scratch_;
+  const std::string clips_ = scratch_.folder() + "/clips";
+  std::string clip_;
   Doors doors_;  // ahead of the context, whose sessions go with it
   boost::asio::io_context context_{1};
   std::unique_ptr<Studio> studio_;

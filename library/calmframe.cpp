@@ -9,6 +9,7 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <limits>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -347,12 +348,18 @@ calmframe_result calmframe_get_saved_file(const char* path, calmframe_saved* sav
     ExpectPointer(saved, "saved");
     const calmframe::host::Project project = calmframe::host::LoadProject(path);
     const std::int64_t divisor = std::gcd(HX_TICKS_PER_SECOND, project.ticks_per_frame);
+    // Of numbers beyond these no session can be opened.
+    const auto number = [path](std::int64_t value) {
+      if (value <= std::numeric_limits<std::int32_t>::max())
+        return static_cast<std::int32_t>(value);
+      throw calmframe::host::ProjectFailure(std::string(path) + ": is of no frames that go here");
+    };
     *saved = {.width = project.width,
               .height = project.height,
               .aspect_num = project.pixel_aspect.num,
-              .aspect_den = static_cast<std::int32_t>(project.pixel_aspect.den),
-              .rate_num = static_cast<std::int32_t>(HX_TICKS_PER_SECOND / divisor),
-              .rate_den = static_cast<std::int32_t>(project.ticks_per_frame / divisor),
+              .aspect_den = number(project.pixel_aspect.den),
+              .rate_num = number(HX_TICKS_PER_SECOND / divisor),
+              .rate_den = number(project.ticks_per_frame / divisor),
               .frame_count = project.end_frame};
     return CALMFRAME_OK;
   } catch (...) {

@@ -95,7 +95,8 @@ typedef struct calmframe_image {
    CALMFRAME_ERROR_SOURCE. Called on the session's threads and on those that render, never twice at
    a time. While the clip is worked frames are asked for in order, each once, but for those about
    the border of two shots. It may call nothing of this library but calmframe_cancel,
-   calmframe_get_progress and calmframe_get_state on its own session. */
+   calmframe_get_progress and calmframe_get_state on its own session, and must come back: what it
+   throws counts as any other number, while longjmp would leave locks held. */
 typedef int32_t (*calmframe_fetch)(void* user, int64_t frame, calmframe_image* image);
 
 /* Which shots a clip has; each is steadied by itself. */

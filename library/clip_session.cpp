@@ -20,6 +20,11 @@ namespace {
   throw Refusal(code, line);
 }
 
+// What waits for the session's threads, one of which may be waiting for this one.
+void ExpectNotFetching() {
+  if (FrameFeed::IsFetching()) Refuse(CALMFRAME_ERROR_STATE, "a frame is being fetched");
+}
+
 // As of a SteadyClip: the first host of a process settles which parameters are declared.
 host::HostSettings WithExperimental() {
   host::HostSettings settings;
@@ -138,7 +143,7 @@ void ClipSession::Finish() {
 }
 
 calmframe_result ClipSession::Wait(std::int64_t milliseconds) {
-  if (FrameFeed::IsFetching()) Refuse(CALMFRAME_ERROR_STATE, "a frame is being fetched");
+  ExpectNotFetching();
   std::unique_lock lock(mutex_);
   if (state_ == CALMFRAME_IDLE) Refuse(CALMFRAME_ERROR_STATE, "nothing was begun");
   const auto is_over = [this] { return closing_ || state_ != CALMFRAME_WORKING; };
@@ -283,7 +288,11 @@ class ClipSession::ShotHold {
 };
 
 void ClipSession::Path(std::int64_t first, std::int64_t count, calmframe_place* places) {
+  ExpectNotFetching();
   if (count < 0 || first < 0) Refuse(CALMFRAME_ERROR_ARGUMENT, "frames below 0");
+  if (count > kMostFrames || first > kMostFrames) {
+    Refuse(CALMFRAME_ERROR_ARGUMENT, "more frames than a clip can have");
+  }
   for (const std::int64_t end = first + count; first < end;) {
     const ShotHold hold(*this, first);
     std::unique_lock lock(mutex_);
@@ -312,7 +321,7 @@ void ClipSession::Render(std::int64_t frame, const calmframe_image* source,
                          const calmframe_image* out) {
   request_.format.Check(out, "the output");
   if (source) request_.format.Check(source, "the source");
-  if (FrameFeed::IsFetching()) Refuse(CALMFRAME_ERROR_STATE, "a frame is being fetched");
+  ExpectNotFetching();
   const ShotHold hold(*this, frame);
   if (feed_.is_pushed() && !source) {
     Refuse(CALMFRAME_ERROR_ARGUMENT,
@@ -355,6 +364,7 @@ void ClipSession::Render(std::int64_t frame, const calmframe_image* source,
 // -- Saved work --
 
 host::Project ClipSession::Save() {
+  ExpectNotFetching();
   {
     const std::lock_guard lock(mutex_);
     ExpectSolved();

@@ -221,7 +221,8 @@ void FrameFormat::Check(const calmframe_image* image, const char* what) const {
     const std::string name = std::string(what) + ": plane " + std::to_string(plane);
     if (!image->plane[plane]) Refuse(name + " is null");
     const std::ptrdiff_t stride = image->stride[plane];
-    if (std::abs(stride) < row_bytes(plane) || std::abs(stride) > std::numeric_limits<int>::max()) {
+    constexpr std::ptrdiff_t kMost = std::numeric_limits<int>::max();
+    if (stride > kMost || stride < -kMost || std::abs(stride) < row_bytes(plane)) {
       Refuse(name + " has rows of " + std::to_string(row_bytes(plane)) + " bytes, " +
              std::to_string(stride) + " apart");
     }

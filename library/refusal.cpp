@@ -1,6 +1,7 @@
 #include "library/refusal.h"
 
 #include <cstdio>
+#include <filesystem>
 #include <new>
 #include <system_error>
 
@@ -40,6 +41,8 @@ calmframe_result TellException(char* line, std::size_t size) noexcept {
     return tell(CALMFRAME_ERROR_FILE, failure.what());
   } catch (const media::Failure& failure) {
     return tell(CALMFRAME_ERROR_SOURCE, failure.what());
+  } catch (const std::filesystem::filesystem_error& error) {  // no folder for temporary files
+    return tell(CALMFRAME_ERROR_FILE, error.what());
   } catch (const std::system_error& error) {  // a thread that can't be started
     return tell(CALMFRAME_ERROR_MEMORY, error.what());
   } catch (const std::exception& error) {

@@ -1,6 +1,5 @@
 #include "library/session_request.h"
 
-#include <cstdint>
 #include <vector>
 
 #include "host/media/ffmpeg.h"
@@ -10,9 +9,6 @@
 
 namespace calmframe::library {
 namespace {
-
-// As for clips of files: what a table of tracks is made for.
-constexpr std::int64_t kMostFrames = 10'000'000;
 
 void Expect(bool holds, const std::string& line) {
   if (!holds) throw Refusal(CALMFRAME_ERROR_ARGUMENT, line);
@@ -68,6 +64,7 @@ host::ShotRequest ShotsOf(const calmframe_options& options) {
       return {.kind = Kind::automatic};
     case CALMFRAME_SHOTS_LIST: {
       Expect(options.shot_starts || options.shot_start_count == 0, "shot_starts is null");
+      Expect(options.shot_start_count <= std::size_t{kMostFrames}, "too many shot_starts");
       std::vector<std::int64_t> starts(options.shot_starts,
                                        options.shot_starts + options.shot_start_count);
       for (std::size_t i = 0; i < starts.size(); ++i) {

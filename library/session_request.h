@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
 
 #include "host/stabilize/film.h"
@@ -8,6 +9,9 @@
 #include "platform/tessel/guid.h"
 
 namespace calmframe::library {
+
+// As for clips of files: what a table of tracks is made for.
+constexpr std::int64_t kMostFrames = 10'000'000;
 
 // What a session is asked for, without what the options point at.
 struct SessionRequest {

@@ -39,6 +39,14 @@ std::string FigureOf(const batch::Record& record, const char* name, int digits) 
   return Fixed(figure->get<double>(), digits);
 }
 
+// Of a file that others may have written: empty of what is no picture within the page.
+std::string PictureIn(const nlohmann::ordered_json& object, const char* name) {
+  const auto url = object.find(name);
+  if (url == object.end() || !url->is_string()) return "";
+  const auto text = url->get<std::string>();
+  return text.starts_with("data:image/") ? text : "";
+}
+
 // The columns of the table and of the page, behind the clip's name.
 struct Row {
   std::string state, seconds, zoom, shake, says;
@@ -173,7 +181,7 @@ std::string BatchResults::Table() const {
     if (!results_[n]) continue;
     const Row row = RowOf(*results_[n]);
     rows.push_back(
-        {Shown(plan_.tasks[n].clip), row.state, row.seconds, row.zoom, row.shake, row.says});
+        {Shown(plan_.tasks[n].clip), row.state, row.seconds, row.zoom, row.shake, Shown(row.says)});
   }
   std::vector<std::size_t> widths(rows[0].size());
   for (const auto& row : rows) {
@@ -224,8 +232,8 @@ void BatchResults::WritePage() const {
       const auto pictures =
           n < kMostPictures ? batch::ReadObject(plan_.FolderOf(task).pictures()) : std::nullopt;
       if (pictures) {
-        told.before = pictures->value("before", "");
-        told.after = pictures->value("after", "");
+        told.before = PictureIn(*pictures, "before");
+        told.after = PictureIn(*pictures, "after");
       }
     }
     page.rows.push_back(std::move(told));

@@ -112,8 +112,8 @@ StudioCommand::StudioCommand(CLI::App& program)
 void StudioCommand::Run() {
   studio::ServerSettings settings;
   if (!listen_.empty()) settings.address = listen_;
-  if (!password_file_.empty()) settings.password = PasswordIn(password_file_);
-  if (!IsLoopback(settings.address) && settings.password.empty()) {
+  if (!password_file_.empty()) settings.studio.password = PasswordIn(password_file_);
+  if (!IsLoopback(settings.address) && settings.studio.password.empty()) {
     throw UsageFailure("--listen " + listen_ + " lets other machines in: it takes --password-file");
   }
   settings.port = port_;

@@ -1,9 +1,11 @@
 #include "host/batch/child.h"
 
 #include <fcntl.h>
+#include <linux/close_range.h>
 #include <poll.h>
 #include <signal.h>
 #include <sys/prctl.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -29,6 +31,8 @@ constexpr std::size_t kLongestLine = 1 << 20;
   setpgid(0, 0);
   const int none = open("/dev/null", O_RDONLY);
   if (none < 0 || dup2(none, 0) < 0 || dup2(says, 1) < 0 || dup2(says, 2) < 0) _exit(127);
+  // Not all that is open closes by itself: sockets of a library's, and what was opened this moment.
+  syscall(SYS_close_range, 3u, ~0u, CLOSE_RANGE_CLOEXEC);
   if (kept >= 0) fcntl(kept, F_SETFD, 0);
   // nohup's, and what the program does by itself, go on; handlers don't outlast exec.
   execv(words[0], words);
@@ -94,6 +98,12 @@ void Child::AskToEnd() {
   if (is_asked_ || has_ended_) return;
   is_asked_ = true;
   kill(process_, SIGTERM);
+}
+
+void Child::Kill() {
+  if (has_ended_) return;
+  kill(-process_, SIGKILL);
+  kill(process_, SIGKILL);  // one that has left its group
 }
 
 int Child::Wait() {

@@ -9,7 +9,8 @@ namespace calmframe::batch {
 
 // A program that runs beside this one: its crash is its own, and it is asked to end when this one
 // ends in whatever way, or when the thread does that started it. It has a process group of its own,
-// so that a Ctrl-C reaches it once, from here. For one thread.
+// so that a Ctrl-C reaches it once, from here, and inherits no descriptor but those that are named.
+// For one thread.
 class Child {
  public:
   // words: the program's path first. It reads nothing; what it says by either stream comes as
@@ -26,6 +27,8 @@ class Child {
   Said Next(std::string& line, int milliseconds);
   // Asks it to end, once.
   void AskToEnd();
+  // Ends it and what it has started, whether it listens or not.
+  void Kill();
   // Waits for its end: its exit code, or 128 + the signal that ended it.
   int Wait();
 

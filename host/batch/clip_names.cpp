@@ -83,8 +83,10 @@ std::string TaskId(const std::string& output) {
 
 std::string Shown(const std::string& name) {
   std::string shown;
-  for (const char c : name) {
+  for (std::size_t at = 0; at < name.size(); ++at) {
+    const char c = name[at];
     const auto byte = static_cast<unsigned char>(c);
+    const auto next = static_cast<unsigned char>(at + 1 < name.size() ? name[at + 1] : 0);
     char code[8] = "";
     if (c == '\n') {
       shown += "\\n";
@@ -93,6 +95,10 @@ std::string Shown(const std::string& name) {
     } else if (byte < 32 || byte == 127) {
       std::snprintf(code, sizeof code, "\\x%02x", byte);
       shown += code;
+    } else if (byte == 0xc2 && next >= 0x80 && next < 0xa0) {  // terminals obey these, too
+      std::snprintf(code, sizeof code, "\\u%04x", next);
+      shown += code;
+      ++at;
     } else {
       shown += c;
     }

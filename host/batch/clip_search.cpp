@@ -1,5 +1,7 @@
 #include "host/batch/clip_search.h"
 
+#include <sys/stat.h>
+
 #include <algorithm>
 #include <cctype>
 #include <cstring>
@@ -128,13 +130,17 @@ class Search {
     }
   }
 
-  // By the records of a batch whose folder is one of those that the file lies in.
+  // By the records of a batch whose folder is one of those that the file lies in. In folders that
+  // all may write into anybody could keep records: those count that are of whoever owns the file.
   bool IsOutput(const fs::path& place) {
+    struct stat file = {}, records = {};
+    stat(place.c_str(), &file);
     for (fs::path folder = place.parent_path();; folder = folder.parent_path()) {
       const auto [known, is_new] = is_batch_.try_emplace(folder.string(), false);
       std::error_code error;
       if (is_new) known->second = fs::is_directory(folder / kRecordsFolder, error);
-      if (known->second) {
+      if (known->second && stat((folder / kRecordsFolder).c_str(), &records) == 0 &&
+          records.st_uid == file.st_uid) {
         const TaskFolder task(folder.string(), place.lexically_relative(folder).string());
         const std::optional<Record> record = ReadRecord(task.record());
         if (record && record->output_identity) return true;

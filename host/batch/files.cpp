@@ -64,6 +64,10 @@ void SweepParts(const std::string& folder) {
 }
 
 std::optional<nlohmann::ordered_json> ReadObject(const std::string& path) {
+  // In a folder that others write into there may be anything, such as a pipe that nobody feeds.
+  constexpr std::int64_t kMostBytes = std::int64_t{256} << 20;
+  const auto there = IdentityOf(path);
+  if (!there || there->size > kMostBytes) return std::nullopt;
   std::string text;
   try {
     std::ifstream file(path, std::ios::binary);

@@ -28,7 +28,7 @@ bool WriteWhole(const std::string& path, const std::string& text);
 // Removes what a program that was killed was writing into a folder; for whoever holds its lock.
 void SweepParts(const std::string& folder);
 
-// The file as an object; none where it isn't there, or is anything else.
+// The file as an object; none where it isn't there, is anything else, or is larger than any.
 std::optional<nlohmann::ordered_json> ReadObject(const std::string& path);
 
 // A lock that the kernel gives back when the last process that holds the descriptor has ended,

@@ -16,8 +16,9 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr std::size_t kLeastFrames = 250;  // whose drawing outweighs a program's start
-constexpr std::size_t kMostPieces = 400;   // of a film; each is a file until it is joined
+constexpr std::size_t kLeastFrames = 250;        // whose drawing outweighs a program's start
+constexpr std::size_t kMostFrames = 10'000'000;  // of a clip, as host/media takes them
+constexpr std::size_t kMostPieces = 400;         // of a film; each is a file until it is joined
 
 // In frames of the film, the end left out.
 struct Stretch {
@@ -77,11 +78,16 @@ class SplitFilm {
   void ReadShots() {
     const auto json = ReadObject(plan_.folder + "/" + Looking().tasks[0].output);
     if (!json) throw std::runtime_error("its shots were not found");
+    // Of a process that reads what strangers made.
+    bool is_a_film = true;
     for (const auto& shot : json->at("shots")) {
-      shots_.push_back(
-          {shot.at("first_frame").get<std::size_t>(), shot.at("end_frame").get<std::size_t>()});
+      const Stretch told{shot.at("first_frame").get<std::size_t>(),
+                         shot.at("end_frame").get<std::size_t>()};
+      is_a_film = is_a_film && told.first < told.end && told.end <= kMostFrames &&
+                  (shots_.empty() || told.first == shots_.back().end);
+      shots_.push_back(told);
     }
-    if (shots_.empty()) throw std::runtime_error("its shots were not found");
+    if (!is_a_film || shots_.empty()) throw std::runtime_error("its shots were not found");
   }
 
   Plan Analysis() const {

@@ -57,11 +57,21 @@ void ReadShots(SqliteDatabase& database, const std::string& path, std::size_t mo
                       "SELECT number, start_frame, length, choice, length(instance), instance "
                       "FROM shot ORDER BY number");
   SqliteStatement parameter(database, "SELECT disk_id, value FROM parameter WHERE shot = ?");
+  // Pages may be those of many rows, all of which would be in memory.
+  std::error_code error;
+  std::uintmax_t left = fs::file_size(path, error);
+  const auto take = [&left](std::uintmax_t bytes) {
+    if (bytes > left) throw SqliteError(SQLITE_CORRUPT, "shot");
+    left -= bytes;
+  };
   while (row.Step()) {
+    constexpr int kLeastBytes = 32;  // of a row
+    take(kLeastBytes + static_cast<std::uintmax_t>(row.Integer(4)));
     SavedShot& shot = project.shots.emplace_back();
     shot.start_frame = static_cast<std::int32_t>(row.Integer(1));
     shot.length = static_cast<std::int32_t>(row.Integer(2));
     shot.choice = row.Text(3);
+    take(shot.choice.size());
     shot.effect.match_name = match_name;
     shot.effect.instance = BytesOf(row, 5, path, most);
     parameter.Bind(1, row.Integer(0));

@@ -156,6 +156,7 @@ void Fail(const std::string& path, const SqliteError& error) {
       Fail(path, "is no project");
     case SQLITE_CORRUPT:
     case SQLITE_ERROR:
+    case SQLITE_INTERRUPT:
       Fail(path, "is damaged");
     case SQLITE_FULL:
       Fail(path, "the disk is full");

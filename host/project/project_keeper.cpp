@@ -40,6 +40,7 @@ void ProjectKeeper::Keep(std::size_t number, const std::uint8_t* bytes, std::siz
   const Clock::time_point begun = Clock::now();
   if (!std::filesystem::exists(path_)) CreateWithoutWork(path_);
   SqliteDatabase database(path_, SQLITE_OPEN_READWRITE);
+  database.ExpectPlainTables();
   database.Run(
       "PRAGMA synchronous = FULL; BEGIN IMMEDIATE;"
       "CREATE TABLE IF NOT EXISTS analysis (start_frame INTEGER, number INTEGER,"

@@ -19,7 +19,7 @@ class SqliteError : public std::runtime_error {
 
 // An open database, for one thread. Waits some seconds for others that use it. Every operation
 // throws SqliteError. What a strange file computes as it is read is kept out: its views and
-// triggers are never run.
+// triggers are never run; nor does its journal lead to other files.
 class SqliteDatabase {
  public:
   // flags: SQLITE_OPEN_*.
@@ -31,12 +31,14 @@ class SqliteDatabase {
   void Run(const char* sql);
   std::int64_t Number(const char* sql);  // first column of the first row; 0 without one
   // Throws SqliteError, as for a damaged file, where one of its tables is not just what was stored:
-  // a view, a module's, or one with columns that are computed, which may go on for ever.
+  // a view, a module's, or one with columns, indices or conditions that are computed, which may go
+  // on for ever.
   void ExpectPlainTables();
   sqlite3* get() const { return database_; }
 
  private:
   sqlite3* database_ = nullptr;
+  int millions_left_ = 200;  // of SQLite's steps: a film of 3000 shots takes 2
 };
 
 class SqliteStatement {

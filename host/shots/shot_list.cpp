@@ -4,6 +4,7 @@
 #include <cctype>
 #include <cmath>
 #include <cstdio>
+#include <cstring>
 #include <nlohmann/json.hpp>
 
 namespace calmframe::host {
@@ -37,8 +38,10 @@ std::string TimeCode(std::int64_t frame, const ListedFilm& film) {
   return text;
 }
 
+// A spreadsheet computes what begins with one of these, quoted or not, unless it is told so.
 std::string Quoted(const std::string& text) {
   std::string quoted = "\"";
+  if (!text.empty() && std::strchr("=+-@\t\r", text[0])) quoted += '\'';
   for (const char c : text) {
     if (c == '"') quoted += '"';
     quoted += c;

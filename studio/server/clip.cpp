@@ -23,6 +23,11 @@ std::string EndText(int code, const std::string& said) {
   return "the clip's worker ended" + (said.empty() ? std::string() : ": " + said);
 }
 
+void ExpectText(const nlohmann::json& object, const char* name) {
+  const auto text = object.find(name);
+  if (text != object.end() && !text->is_string()) throw BadMessage("a text is none");
+}
+
 }  // namespace
 
 Clip::Clip(const ClipSurroundings& surroundings, std::string id, std::string path,
@@ -46,8 +51,9 @@ Clip::Clip(const ClipSurroundings& surroundings, const nlohmann::json& kept, std
   state_["outcome"] = kept.value("outcome", nlohmann::json());
 }
 
+// Whoever still waits for an answer may be gone, too.
 Clip::~Clip() {
-  CloseWorker();
+  if (worker_) worker_->Close();
 }
 
 void Clip::Open() {
@@ -88,15 +94,20 @@ void Clip::CloseWorker() {
   waiting_.clear();
 }
 
+// What a clip has made of its worker is not known: what the studio itself goes by is of its kind.
 void Clip::Take(Message message) {
+  for (const char* name : {"error", "why"}) ExpectText(message.head, name);
   if (message.head.contains("tells")) {
+    if (!message.head["tells"].is_object()) throw BadMessage("what is told is no object");
+    for (const char* name : {"state", "error"}) ExpectText(message.head["tells"], name);
     for (auto& [key, value] : message.head["tells"].items()) {
       if (key == "settings") {
         settings_ = SettingsOf(value);
         has_settings_ = true;
       } else if (key == "path") {
         path_ = value.get<std::string>();
-      } else if ((key == "panel" || key == "picture" || key == "curves") && value.is_number()) {
+      } else if ((key == "panel" || key == "picture" || key == "curves") &&
+                 value.is_number_unsigned()) {
         state_[key] = workers_ + value.get<std::uint64_t>();
       } else {
         state_[key] = std::move(value);
@@ -210,7 +221,9 @@ void Clip::RestoreTracks() {
 }
 
 void Clip::Change(Settings settings, const std::string& what) {
-  if (JsonOf(settings) == JsonOf(settings_)) return;
+  const nlohmann::json json = JsonOf(settings);
+  SettingsOf(json);  // as it will be read again, from what is kept too
+  if (json == JsonOf(settings_)) return;
   constexpr std::chrono::milliseconds kOneStep(900);
   const auto now = std::chrono::steady_clock::now();
   if (what.empty() || what != changed_last_ || now - changed_at_ > kOneStep || undo_.empty()) {

@@ -29,6 +29,7 @@ constexpr std::size_t kMostBody = 256 << 10;
 constexpr std::chrono::seconds kPatience(20);
 constexpr int kMostConnections = 256;
 constexpr int kMostStreams = 32;
+constexpr int kMostGuesses = 4;                             // wrong passwords a second
 constexpr std::size_t kMostPending = std::size_t{8} << 20;  // bytes of events that a window lags
 
 constexpr char kPolicy[] =
@@ -118,7 +119,7 @@ class Session : public std::enable_shared_from_this<Session> {
     if (path_ == "/" && !FieldOf(query_, "token").empty() && doors_.password.empty()) {
       return Enter(FieldOf(query_, "token"));
     }
-    if (!IsSame(CookieOf(Header(http::field::cookie), doors_.cookie), studio_.secret())) {
+    if (!BringsCookie(Header(http::field::cookie), doors_.cookie, studio_.secret())) {
       return Refuse();
     }
     if (posts) return path_ == "/api/do" ? Do(request.body()) : NotFound();
@@ -135,12 +136,19 @@ class Session : public std::enable_shared_from_this<Session> {
   }
 
   void Login(const std::string& form) {
+    if (doors_.guesses >= kMostGuesses) {
+      return Fail(http::status::too_many_requests, "too many wrong passwords; try again", true);
+    }
     if (!doors_.password.empty() && IsSame(FieldOf(form, "password"), doors_.password)) {
       return Welcome();
     }
-    // Whoever guesses waits.
+    // Whoever guesses waits, and nobody else guesses much meanwhile.
+    ++doors_.guesses;
     timer_.expires_after(std::chrono::seconds(1));
-    timer_.async_wait([self = shared_from_this()](const error_code&) { self->Refuse(); });
+    timer_.async_wait([self = shared_from_this()](const error_code&) {
+      --self->doors_.guesses;
+      self->Refuse();
+    });
   }
 
   void Welcome() {
@@ -199,7 +207,7 @@ class Session : public std::enable_shared_from_this<Session> {
     const std::string side = FieldOf(query_, "side");
     Ask(clip,
         {{"op", "frame"},
-         {"frame", NumberIn(query_, "frame", 0)},
+         {"frame", std::clamp<std::int64_t>(NumberIn(query_, "frame", 0), 0, kMostFrames)},
          {"width", std::clamp<std::int64_t>(NumberIn(query_, "width", 640), 16, 8192)},
          {"tracks", side == "tracks"},
          {"before", side != "after" && side != "tracks"},

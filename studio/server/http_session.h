@@ -15,6 +15,7 @@ struct Doors {
   std::string password;  // that a person set; empty: none, and the address has the secret
   int connections = 0;   // that are open
   int streams = 0;       // of events
+  int guesses = 0;       // wrong passwords of the last second
   bool closed = false;   // the studio is gone
 };
 

@@ -2,17 +2,20 @@
 
 #include <algorithm>
 #include <boost/asio/post.hpp>
+#include <chrono>
 #include <exception>
 #include <filesystem>
 #include <system_error>
 #include <utility>
 
+#include "host/base/json_depth.h"
 #include "host/batch/child.h"
 
 namespace calmframe::studio {
 namespace {
 
 constexpr std::size_t kMostJobs = 200;
+constexpr std::size_t kMostNotes = 50;  // of a job
 
 std::string Number(double value) {
   return nlohmann::json(value).dump();
@@ -67,6 +70,10 @@ RenderQueue::~RenderQueue() {
   }
 }
 
+std::string RenderQueue::ProjectOf(std::uint64_t number) const {
+  return folder_ + "/render-" + std::to_string(number) + ".calm";
+}
+
 RenderQueue::Job* RenderQueue::Find(std::uint64_t number) const {
   for (const std::unique_ptr<Job>& job : jobs_) {
     if (job->number == number) return job.get();
@@ -93,9 +100,9 @@ void RenderQueue::Add(RenderOrder order) {
 void RenderQueue::Remove(std::uint64_t number) {
   Job* const job = Find(number);
   if (!job) return;
-  if (job->state == "running" || job->state == "saving") {
+  if (job->state == "running") {
     *job->stops = true;
-  } else if (job->state == "waiting") {
+  } else if (job->state == "waiting" || job->state == "saving") {
     job->state = "cancelled";
   } else {
     std::erase_if(jobs_, [job](const auto& other) { return other.get() == job; });
@@ -118,13 +125,17 @@ void RenderQueue::Next() {
   }
   if (!next) return;
   next->state = "saving";
-  next->project = folder_ + "/render-" + std::to_string(next->number) + ".calm";
+  next->project = ProjectOf(next->number);
   save_(next->order.clip, next->project,
         [this, number = next->number](const std::string& error, const Settings& settings) {
           Job* const job = Find(number);
-          if (!job) return;
-          if (*job->stops || !error.empty()) {
-            job->state = *job->stops ? "cancelled" : "failed";
+          if (!job || job->state != "saving") {  // nobody waits for it any more
+            std::error_code ignored;
+            std::filesystem::remove(ProjectOf(number), ignored);
+            return;
+          }
+          if (!error.empty()) {
+            job->state = "failed";
             job->error = error;
             Next();
           } else {
@@ -153,14 +164,22 @@ void RenderQueue::Run(Job& job, const Settings& settings) {
     int code = 127;
     try {
       batch::Child child(words);
+      using Clock = std::chrono::steady_clock;
+      constexpr std::chrono::seconds kUntilKilled(20);
       std::string line;
+      std::optional<Clock::time_point> stopped;
       while (true) {
         const batch::Child::Said said = child.Next(line, 100);
-        if (*stops) child.AskToEnd();
+        if (*stops) {
+          child.AskToEnd();
+          if (!stopped) stopped = Clock::now();
+          if (Clock::now() - *stopped > kUntilKilled) break;
+        }
         if (said == batch::Child::Said::end) break;
         if (said != batch::Child::Said::line) continue;
         boost::asio::post(context_, [this, number, line] { Heard(number, line); });
       }
+      child.Kill();  // see WorkerProcess::Start
       code = child.Wait();
     } catch (const std::exception& error) {
       const nlohmann::json told = {{"error", error.what()}};
@@ -173,18 +192,24 @@ void RenderQueue::Run(Job& job, const Settings& settings) {
 void RenderQueue::Heard(std::uint64_t number, const std::string& line) {
   Job* const job = Find(number);
   if (!job) return;
-  const nlohmann::json told = nlohmann::json::parse(line, nullptr, false);
+  const nlohmann::json told =
+      NestsTooDeep(line) ? nullptr : nlohmann::json::parse(line, nullptr, false);
   if (!told.is_object()) {
     job->error = line;
     return;
   }
-  if (told.contains("error")) job->error = told["error"].get<std::string>();
-  if (told.contains("warning")) job->notes.push_back(told["warning"].get<std::string>());
-  if (told.value("stage", "") == "rendering") {
-    job->share = told.value("share", 0.0);
-    const double elapsed = told.value("elapsed", 0.0);
-    job->left = nullptr;
-    if (job->share > 0.02) job->left = elapsed * (1 - job->share) / job->share;
+  try {
+    if (told.contains("error")) job->error = told["error"].get<std::string>();
+    if (told.contains("warning") && job->notes.size() < kMostNotes) {
+      job->notes.push_back(told["warning"].get<std::string>());
+    }
+    if (told.value("stage", "") == "rendering") {
+      job->share = std::clamp(told.value("share", 0.0), 0.0, 1.0);
+      const double elapsed = told.value("elapsed", 0.0);
+      job->left = nullptr;
+      if (job->share > 0.02) job->left = elapsed * (1 - job->share) / job->share;
+    }
+  } catch (const nlohmann::json::exception&) {  // of a program that a clip has taken over
   }
   changed_();
 }

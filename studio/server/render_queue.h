@@ -58,6 +58,7 @@ class RenderQueue {
   void Heard(std::uint64_t number, const std::string& line);
   void Ended(std::uint64_t number, int code);
   Job* Find(std::uint64_t number) const;
+  std::string ProjectOf(std::uint64_t number) const;
 
   boost::asio::io_context& context_;
   const std::string program_, folder_;

@@ -1,5 +1,7 @@
 #include "studio/server/server.h"
 
+#include <fcntl.h>
+
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/ip/tcp.hpp>
 #include <boost/asio/signal_set.hpp>
@@ -8,6 +10,7 @@
 #include <csignal>
 
 #include "studio/server/http_session.h"
+#include "studio/server/trust.h"
 
 namespace calmframe::studio {
 namespace {
@@ -24,6 +27,7 @@ class Acceptor {
     if (error) throw CannotListen(settings.address + ": is no address in numbers");
     const tcp::endpoint endpoint(address, static_cast<std::uint16_t>(settings.port));
     acceptor_.open(endpoint.protocol(), error);
+    fcntl(acceptor_.native_handle(), F_SETFD, FD_CLOEXEC);  // the browser outlives the studio
     if (!error) acceptor_.set_option(tcp::acceptor::reuse_address(true), error);
     if (!error) acceptor_.bind(endpoint, error);
     if (!error) acceptor_.listen(boost::asio::socket_base::max_listen_connections, error);
@@ -44,7 +48,10 @@ class Acceptor {
   void Accept(Studio& studio, Doors& doors) {
     acceptor_.async_accept([this, &studio, &doors](const error_code& error, tcp::socket socket) {
       if (error == boost::asio::error::operation_aborted) return;
-      if (!error) ServeConnection(std::move(socket), studio, doors);
+      // With a password anybody may come who has it.
+      if (!error && (!doors.password.empty() || !IsOfAnotherUser(socket))) {
+        ServeConnection(std::move(socket), studio, doors);
+      }
       if (!error) return Accept(studio, doors);
       // Such as no descriptor left: others end meanwhile.
       pause_.expires_after(std::chrono::milliseconds(100));
@@ -67,7 +74,7 @@ void Serve(const ServerSettings& settings) {
   Acceptor acceptor(context, settings);
   Studio studio(context, settings.studio);
   doors.name = settings.name;
-  doors.password = settings.password;
+  doors.password = settings.studio.password;
   doors.cookie = "calmframe_" + std::to_string(acceptor.port());
   // The first is there by the time that the page is.
   std::string first;
@@ -80,8 +87,9 @@ void Serve(const ServerSettings& settings) {
   signals.async_wait([&context](const error_code&, int) { context.stop(); });
   acceptor.Accept(studio, doors);
   if (settings.listens) {
-    settings.listens(settings.password.empty() ? acceptor.place() + "?token=" + studio.secret()
-                                               : acceptor.place());
+    settings.listens(settings.studio.password.empty()
+                         ? acceptor.place() + "?token=" + studio.secret()
+                         : acceptor.place());
   }
   context.run();
   doors.closed = true;

@@ -13,7 +13,6 @@ struct ServerSettings {
   std::string address = "127.0.0.1";
   int port = 0;                    // 0: one that is free
   std::string name;                // of the machine, by which others may call it; empty: none
-  std::string password;            // needed for any address but the loopback's
   std::vector<std::string> clips;  // to be opened
   // Told once it listens: the address for a browser.
   std::function<void(const std::string& address)> listens;

@@ -1,15 +1,19 @@
 #include "studio/server/studio.h"
 
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <chrono>
 #include <cstring>
 #include <filesystem>
+#include <limits>
 #include <stdexcept>
 #include <utility>
 
+#include "platform/tessel/guid.h"
 #include "studio/server/trust.h"
 
 namespace calmframe::studio {
@@ -22,8 +26,27 @@ constexpr std::size_t kMostOpen = 4;
 constexpr std::size_t kMostClips = 500;
 constexpr char kSession[] = "/session.json";
 
+using Corners = std::vector<std::array<double, 2>>;
+constexpr std::size_t kMostCorners = 1000;  // of a lasso: each is held against every track
+constexpr std::int32_t kMostControl = std::numeric_limits<std::int32_t>::max();  // disk id
+constexpr std::size_t kMostWays = 1000;
+constexpr std::uint64_t kMostRenders = std::uint64_t{1} << 53;
+
 bool IsProject(const std::string& path) {
   return fs::path(path).extension() == ".calm";
+}
+
+// By which a password is known again; empty of none.
+std::string MarkOf(const std::string& password, const std::string& secret) {
+  return password.empty() ? "" : tessel::utility::Guid::FromText(secret + password).ToText();
+}
+
+// Throws std::invalid_argument beyond 0 to `most`, which a conversion would make another number.
+template <class Whole>
+Whole WholeIn(const nlohmann::json& request, const char* name, Whole most) {
+  const double number = request.at(name).get<double>();
+  if (number >= 0 && number <= static_cast<double>(most)) return static_cast<Whole>(number);
+  throw std::invalid_argument(std::string(name) + ": out of range");
 }
 
 }  // namespace
@@ -43,7 +66,12 @@ Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
   surroundings_.worker_words.insert(surroundings_.worker_words.end(), settings.worker.begin(),
                                     settings.worker.end());
   fs::create_directories(work_folder_);
-  chmod(folder_.c_str(), 0700);  // the secret is in it
+  // The secret is in it.
+  struct stat status;
+  if (chmod(folder_.c_str(), 0700) != 0 || stat(folder_.c_str(), &status) != 0 ||
+      status.st_uid != geteuid()) {
+    throw std::runtime_error(folder_ + ": belongs to somebody else, who could let others in");
+  }
   lock_ = std::make_unique<batch::FileLock>(folder_ + "/lock");
   if (!lock_->is_held()) {
     throw std::runtime_error(folder_ +
@@ -67,7 +95,10 @@ Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
         Flush();
       });
   Restore();
-  if (secret_.empty()) secret_ = NewSecret();
+  if (secret_.empty() || kept_password_ != MarkOf(settings.password, secret_)) {
+    secret_ = NewSecret();
+    kept_password_ = MarkOf(settings.password, secret_);
+  }
   Keep();
 }
 
@@ -84,16 +115,15 @@ void Studio::Restore() {
   if (!kept) return;
   try {
     secret_ = kept->value("secret", "");
+    kept_password_ = kept->value("password", "");
     for (const nlohmann::json clip : kept->value("clips", nlohmann::ordered_json::array())) {
-      const std::string id = clip.at("id").get<std::string>();
-      // Where a clip's roots are closed by now, it is none of this studio's business.
       try {
+        const std::string id = clip.at("id").get<std::string>();
         roots_.ExistingClip(clip.value("path", "").empty() ? clip.value("project", "")
                                                            : clip.value("path", ""));
-      } catch (const PathRefused&) {
-        continue;
+        clips_.push_back(std::make_unique<Clip>(surroundings_, clip, KeepPath(id)));
+      } catch (const std::exception&) {  // damaged, or in a folder that is none of this studio's
       }
-      clips_.push_back(std::make_unique<Clip>(surroundings_, clip, KeepPath(id)));
     }
   } catch (const std::exception&) {  // damaged: what could be read stands
   }
@@ -165,13 +195,14 @@ nlohmann::json Studio::Act(const nlohmann::json& request, const Answer& later,
   if (op == "add") return {{"clip", Add(request.at("path").get<std::string>())}};
   if (op == "find") return {{"clip", Add(roots_.Find(request.at("name").get<std::string>()))}};
   if (op == "end render") {
-    renders_->Remove(request.at("render").get<std::uint64_t>());
+    renders_->Remove(WholeIn(request, "render", kMostRenders));
     return nlohmann::json::object();
   }
   Clip& clip = At(request);
   if (op == "remove") {
     const std::string keep = clip.keep(), id = clip.id();
     if (renders_->Needs(id)) throw std::invalid_argument("a render of the clip still waits");
+    clip.CloseWorker();  // whoever waits for an answer looks for clips
     std::erase_if(clips_, [&clip](const auto& one) { return one.get() == &clip; });
     used_.remove(id);
     std::error_code ignored;
@@ -190,13 +221,13 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
   if (op == "open") {
     Open(clip);
   } else if (op == "control") {
-    clip.SetControl(request.at("control").get<std::int32_t>(), request.at("value").get<double>());
+    clip.SetControl(WholeIn(request, "control", kMostControl), request.at("value").get<double>());
   } else if (op == "reset") {
-    clip.ResetControl(request.at("control").get<std::int32_t>());
+    clip.ResetControl(WholeIn(request, "control", kMostControl));
   } else if (op == "window") {
     clip.SetWindow(request.at("name").get<std::string>(), request.at("value"));
   } else if (op == "way") {
-    clip.TakeWay(request.at("way").get<std::size_t>());
+    clip.TakeWay(WholeIn(request, "way", kMostWays));
   } else if (op == "lasso") {
     *answers_later = true;
     AskForTracks(clip, request, later);
@@ -212,7 +243,7 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
   } else if (op == "cancel") {
     clip.Tell({{"op", "cancel"}});
   } else if (op == "look") {
-    clip.Tell({{"op", "look"}, {"frame", request.at("frame").get<std::int64_t>()}});
+    clip.Tell({{"op", "look"}, {"frame", WholeIn(request, "frame", kMostFrames)}});
   } else if (op == "save") {
     const std::string path = roots_.ToWrite(request.at("path").get<std::string>());
     if (!IsProject(path)) throw std::invalid_argument("saved work is named like walk.calm");
@@ -233,7 +264,7 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
     order.clip = clip.id();
     order.name = fs::path(clip.path()).filename();
     order.output = roots_.ToWrite(request.at("path").get<std::string>());
-    order.crf = std::clamp(request.value("crf", order.crf), 0, 63);
+    if (request.contains("crf")) order.crf = WholeIn(request, "crf", 63);
     order.codec = request.value("codec", "");
     order.overwrite = request.value("overwrite", false);
     order.from = request.value("from", "");
@@ -257,9 +288,10 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
 // What a lasso holds; with "deletes" they are deleted, else shown.
 void Studio::AskForTracks(Clip& clip, const nlohmann::json& request, const Answer& later) {
   nlohmann::json head = {{"op", "lasso"},
-                         {"frame", request.at("frame").get<std::int64_t>()},
+                         {"frame", WholeIn(request, "frame", kMostFrames)},
                          {"any_frame", request.value("any_frame", false)},
-                         {"corners", request.value("corners", std::vector<std::vector<double>>())}};
+                         {"corners", request.value("corners", Corners())}};
+  if (head["corners"].size() > kMostCorners) throw std::invalid_argument("too many corners");
   const bool deletes = request.value("deletes", false);
   Open(clip);
   clip.Ask(std::move(head), [this, id = clip.id(), deletes, later](const Message& answer) {
@@ -360,7 +392,8 @@ void Studio::KeepSoon() {
 }
 
 bool Studio::Keep() {
-  nlohmann::json session = {{"secret", secret_}, {"clips", nlohmann::json::array()}};
+  nlohmann::json session = {
+      {"secret", secret_}, {"password", kept_password_}, {"clips", nlohmann::json::array()}};
   for (const std::unique_ptr<Clip>& clip : clips_) session["clips"].push_back(clip->Kept());
   const std::string path = folder_ + kSession;
   if (!batch::WriteWhole(path,

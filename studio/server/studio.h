@@ -25,7 +25,8 @@ struct StudioSettings {
   std::string program;              // that workers and renders are runs of
   std::vector<std::string> worker;  // words behind it that make it a worker; see WorkerProcess
   std::vector<std::string> roots;
-  std::string folder;  // where clips, choices and work are kept; made where it isn't there
+  std::string folder;         // where clips, choices and work are kept; made where it isn't there
+  std::string password = {};  // that lets in; with another one whoever was let in before is out
   // The part of it that workers and renders need: the rest has the secret.
   std::string WorkFolder() const { return folder + "/work"; }
 };
@@ -88,7 +89,7 @@ class Studio {
   const Roots roots_;
   const std::string folder_, work_folder_;
   std::unique_ptr<batch::FileLock> lock_;
-  std::string secret_;
+  std::string secret_, kept_password_;  // the latter as a mark
   EndingThreads ending_;
   ClipSurroundings surroundings_;
   std::vector<std::unique_ptr<Clip>> clips_;

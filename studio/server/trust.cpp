@@ -1,13 +1,19 @@
 #include "studio/server/trust.h"
 
 #include <sys/random.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <boost/asio/ip/address.hpp>
 #include <cctype>
 #include <cerrno>
+#include <cstdint>
+#include <cstdio>
+#include <cstring>
+#include <fstream>
 #include <optional>
+#include <sstream>
 #include <system_error>
 
 namespace calmframe::studio {
@@ -17,7 +23,9 @@ namespace {
 std::string_view NameOf(std::string_view host) {
   if (!host.empty() && host[0] == '[') {
     const std::size_t end = host.find(']');
-    return end == std::string_view::npos ? std::string_view() : host.substr(1, end - 1);
+    if (end == std::string_view::npos) return {};
+    const std::string_view behind = host.substr(end + 1);
+    return behind.empty() || behind[0] == ':' ? host.substr(1, end - 1) : std::string_view();
   }
   return host.substr(0, host.find(':'));
 }
@@ -34,6 +42,32 @@ int DigitOf(char digit) {
   if (digit >= 'a' && digit <= 'f') return digit - 'a' + 10;
   if (digit >= 'A' && digit <= 'F') return digit - 'A' + 10;
   return -1;
+}
+
+// As the kernel lists an end of a connection: words of four bytes as this processor reads them, the
+// port behind; `wide` as IPv6 has it, into which an IPv4 address is mapped.
+std::string ListedAs(const boost::asio::ip::tcp::endpoint& end, bool wide) {
+  namespace ip = boost::asio::ip;
+  if (!wide && end.address().is_v6()) return "";
+  std::string text;
+  char part[9];
+  const auto add = [&](const auto& bytes) {
+    for (std::size_t at = 0; at < bytes.size(); at += 4) {
+      std::uint32_t word = 0;
+      std::memcpy(&word, bytes.data() + at, sizeof word);
+      std::snprintf(part, sizeof part, "%08X", word);
+      text += part;
+    }
+  };
+  if (!wide) {
+    add(end.address().to_v4().to_bytes());
+  } else if (end.address().is_v6()) {
+    add(end.address().to_v6().to_bytes());
+  } else {
+    add(ip::make_address_v6(ip::v4_mapped, end.address().to_v4()).to_bytes());
+  }
+  std::snprintf(part, sizeof part, ":%04X", static_cast<unsigned>(end.port()));
+  return text + part;
 }
 
 std::optional<std::string> Resolved(std::string_view text) {
@@ -91,18 +125,42 @@ bool IsOwnOrigin(std::string_view origin, std::string_view host) {
          IsSameName(origin.substr(kScheme.size()), host);
 }
 
-std::string CookieOf(std::string_view header, std::string_view name) {
+bool IsOfAnotherUser(const boost::asio::ip::tcp::socket& socket) {
+  boost::system::error_code error;
+  const auto theirs = socket.remote_endpoint(error);
+  if (error) return false;
+  const auto own = socket.local_endpoint(error);
+  if (error) return false;
+  for (const bool wide : {false, true}) {
+    const std::string from = ListedAs(theirs, wide), to = ListedAs(own, wide);
+    std::ifstream list(wide ? "/proc/net/tcp6" : "/proc/net/tcp");
+    for (std::string line; std::getline(list, line);) {
+      std::istringstream words(line);
+      std::string skipped, local, remote;
+      words >> skipped >> local >> remote;
+      if (local != from || remote != to) continue;
+      std::uint64_t user = 0, socket_number = 0;
+      words >> skipped >> skipped >> skipped >> skipped >> user >> skipped >> socket_number;
+      // One that was closed already is nobody's, and listed as root's.
+      return socket_number == 0 || (user != 0 && user != geteuid());
+    }
+  }
+  return false;
+}
+
+bool BringsCookie(std::string_view header, std::string_view name, std::string_view value) {
   while (!header.empty()) {
     const std::size_t end = std::min(header.find(';'), header.size());
     std::string_view pair = header.substr(0, end);
     header.remove_prefix(std::min(end + 1, header.size()));
     while (!pair.empty() && pair[0] == ' ') pair.remove_prefix(1);
     const std::size_t sign = pair.find('=');
-    if (sign != std::string_view::npos && pair.substr(0, sign) == name) {
-      return std::string(pair.substr(sign + 1));
+    if (sign != std::string_view::npos && pair.substr(0, sign) == name &&
+        IsSame(pair.substr(sign + 1), value)) {
+      return true;
     }
   }
-  return "";
+  return false;
 }
 
 std::string FieldOf(std::string_view form, std::string_view name) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <boost/asio/ip/tcp.hpp>
 #include <string>
 #include <string_view>
 
@@ -20,8 +21,14 @@ bool IsOwnHost(std::string_view host, std::string_view name);
 // Whether an Origin is that of the page at this Host.
 bool IsOwnOrigin(std::string_view origin, std::string_view host);
 
-// Of a Cookie header; empty without.
-std::string CookieOf(std::string_view header, std::string_view name);
+// Whether another user of this machine than its own and root is at the other end, as the kernel
+// lists it. The secret alone doesn't tell: a browser's command line and its requests to any port of
+// this machine may have shown it to others. False where nothing is listed.
+bool IsOfAnotherUser(const boost::asio::ip::tcp::socket& socket);
+
+// Whether one of a Cookie header's cookies of that name has the value: another port of this machine
+// may have set one, too, that comes first.
+bool BringsCookie(std::string_view header, std::string_view name, std::string_view value);
 // Of "a=b&c=d", the percent signs resolved; empty without, and of what is damaged.
 std::string FieldOf(std::string_view form, std::string_view name);
 

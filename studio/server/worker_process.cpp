@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <chrono>
 #include <exception>
+#include <optional>
 #include <system_error>
 #include <utility>
 
@@ -22,10 +23,7 @@ WorkerProcess::WorkerProcess(boost::asio::io_context& context, EndingThreads& en
     : ending_(ending), socket_(context), events_(std::move(events)), part_(256 << 10) {}
 
 WorkerProcess::~WorkerProcess() {
-  *closed_ = true;
-  error_code ignored;
-  socket_.close(ignored);
-  if (thread_.joinable()) ending_.threads.push_back(std::move(thread_));
+  Close();
 }
 
 std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& context,
@@ -40,36 +38,38 @@ std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& con
   worker->socket_.assign(boost::asio::local::stream_protocol(), ends[0]);
   words.push_back(std::to_string(ends[1]));
   // A child belongs to the thread that started it.
-  worker->thread_ = std::thread([words, theirs = ends[1], closed = worker->closed_, &context,
-                                 weak = std::weak_ptr<WorkerProcess>(worker)] {
+  worker->thread_ = std::thread([words, theirs = ends[1], process = worker->process_, &context,
+                                 weak = std::weak_ptr<WorkerProcess>(worker)]() mutable {
     int code = 127;
     std::string said;
     try {
       batch::Child child(words, theirs);
-      close(theirs);
+      close(std::exchange(theirs, -1));
       using Clock = std::chrono::steady_clock;
-      constexpr std::chrono::seconds kUntilAsked(4);
-      Clock::time_point closed_at = Clock::time_point::max();
+      constexpr std::chrono::seconds kUntilKilled(4);
+      std::optional<Clock::time_point> ends_since;
       std::string line;
       while (true) {
         const batch::Child::Said what = child.Next(line, 200);
         if (what == batch::Child::Said::end) break;
         if (what == batch::Child::Said::line) said = line;
-        if (!*closed) continue;
-        if (closed_at == Clock::time_point::max()) closed_at = Clock::now();
-        if (Clock::now() - closed_at > kUntilAsked) child.AskToEnd();
+        const Process is_to = *process;
+        if (is_to == Process::live) continue;
+        if (!ends_since) ends_since = Clock::now();
+        if (is_to == Process::die || Clock::now() - *ends_since > kUntilKilled) break;
       }
+      // What a clip has taken over may hear nothing, and say nothing any more.
+      child.Kill();
       code = child.Wait();
     } catch (const std::exception& error) {
-      close(theirs);
+      if (theirs >= 0) close(theirs);
       said = error.what();
     }
     boost::asio::post(context, [weak, code, said] {
       const std::shared_ptr<WorkerProcess> ended = weak.lock();
-      if (!ended || *ended->closed_) return;
-      *ended->closed_ = true;
+      if (!ended || ended->closed_) return;
       const auto tell = ended->events_.end;
-      ended->events_ = {};
+      ended->Close();
       if (tell) tell(code, said);
     });
   });
@@ -78,36 +78,42 @@ std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& con
 }
 
 void WorkerProcess::Send(const Message& message) {
-  if (*closed_) return;
+  if (closed_) return;
   out_.push_back(Encode(message));
   if (out_.size() == 1) Write();
 }
 
 void WorkerProcess::Close() {
-  *closed_ = true;
+  closed_ = true;
   events_ = {};
+  HangUp(Process::end);
+  // What is still to be written may hold this until the context goes, after all else.
+  if (thread_.joinable()) ending_.threads.push_back(std::move(thread_));
+}
+
+void WorkerProcess::HangUp(Process is_to) {
+  *process_ = is_to;
   error_code ignored;
   socket_.shutdown(boost::asio::local::stream_protocol::socket::shutdown_both, ignored);
 }
 
 void WorkerProcess::Read() {
-  socket_.async_read_some(boost::asio::buffer(part_), [weak = weak_from_this()](
-                                                          const error_code& error,
-                                                          std::size_t size) {
-    const std::shared_ptr<WorkerProcess> self = weak.lock();
-    if (!self || error || *self->closed_) return;  // its end is told by its process
-    try {
-      self->reader_.Add(self->part_.data(), size);
-      while (std::optional<Message> message = self->reader_.Next()) {
-        if (self->events_.message) self->events_.message(std::move(*message));
-      }
-    } catch (const std::exception&) {  // no message, or one that makes no sense
-      error_code ignored;
-      self->socket_.shutdown(boost::asio::local::stream_protocol::socket::shutdown_both, ignored);
-      return;
-    }
-    self->Read();
-  });
+  socket_.async_read_some(
+      boost::asio::buffer(part_),
+      [weak = weak_from_this()](const error_code& error, std::size_t size) {
+        const std::shared_ptr<WorkerProcess> self = weak.lock();
+        if (!self || self->closed_) return;
+        if (error) return self->HangUp(Process::end);  // its end is told by its process
+        try {
+          self->reader_.Add(self->part_.data(), size);
+          while (std::optional<Message> message = self->reader_.Next()) {
+            if (self->events_.message) self->events_.message(std::move(*message));
+          }
+        } catch (const std::exception&) {  // no message, or one that makes no sense
+          return self->HangUp(Process::die);
+        }
+        self->Read();
+      });
 }
 
 void WorkerProcess::Write() {

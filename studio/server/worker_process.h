@@ -48,6 +48,9 @@ class WorkerProcess : public std::enable_shared_from_this<WorkerProcess> {
 
  private:
   WorkerProcess(boost::asio::io_context& context, EndingThreads& ending, Events events);
+  // What its process is to do; what it says after `end` is not heard any more.
+  enum class Process { live, end, die };
+  void HangUp(Process is_to);
   void Read();
   void Write();
 
@@ -57,7 +60,9 @@ class WorkerProcess : public std::enable_shared_from_this<WorkerProcess> {
   MessageReader reader_;
   std::vector<char> part_;
   std::deque<std::string> out_;
-  const std::shared_ptr<std::atomic<bool>> closed_ = std::make_shared<std::atomic<bool>>(false);
+  bool closed_ = false;
+  const std::shared_ptr<std::atomic<Process>> process_ =
+      std::make_shared<std::atomic<Process>>(Process::live);
   std::thread thread_;  // that the process belongs to
 };
 

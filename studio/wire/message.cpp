@@ -16,7 +16,7 @@ void PutSize(std::size_t size, std::string& to) {
   }
 }
 
-std::size_t SizeAt(const std::string& text, std::size_t place) {
+std::size_t SizeAt(std::string_view text, std::size_t place) {
   std::size_t size = 0;
   for (int i = 3; i >= 0; --i) {
     size = size << 8 | static_cast<std::uint8_t>(text[place + static_cast<std::size_t>(i)]);
@@ -39,20 +39,19 @@ std::string Encode(const Message& message) {
 }
 
 std::optional<Message> MessageReader::Next() {
-  if (pending_.size() < kPrefix) return {};
-  const std::size_t head = SizeAt(pending_, 0), bytes = SizeAt(pending_, 4);
+  const std::string_view left = std::string_view(pending_).substr(taken_);
+  if (left.size() < kPrefix) return {};
+  const std::size_t head = SizeAt(left, 0), bytes = SizeAt(left, 4);
   if (head > kMostHead || bytes > kMostBytes) throw BadMessage("a message is too large");
-  if (pending_.size() < kPrefix + head + bytes) return {};
-  if (NestsTooDeep(std::string_view(pending_).substr(kPrefix, head))) {
-    throw BadMessage("a message is nested too deep");
-  }
-  const auto begin = pending_.begin() + kPrefix;
+  if (left.size() < kPrefix + head + bytes) return {};
+  const std::string_view object = left.substr(kPrefix, head);
+  if (NestsTooDeep(object)) throw BadMessage("a message is nested too deep");
   Message message;
-  message.head = nlohmann::json::parse(begin, begin + static_cast<std::ptrdiff_t>(head), nullptr,
-                                       /*allow_exceptions=*/false);
+  message.head =
+      nlohmann::json::parse(object.begin(), object.end(), nullptr, /*allow_exceptions=*/false);
   if (!message.head.is_object()) throw BadMessage("a message is no object");
-  message.bytes = pending_.substr(kPrefix + head, bytes);
-  pending_.erase(0, kPrefix + head + bytes);
+  message.bytes = left.substr(kPrefix + head, bytes);
+  taken_ += kPrefix + head + bytes;
   return message;
 }
 

@@ -5,6 +5,7 @@
 #include <optional>
 #include <stdexcept>
 #include <string>
+#include <utility>
 
 namespace calmframe::studio {
 
@@ -31,12 +32,16 @@ class MessageReader {
   static constexpr std::size_t kMostHead = std::size_t{16} << 20;
   static constexpr std::size_t kMostBytes = std::size_t{128} << 20;
 
-  void Add(const char* data, std::size_t size) { pending_.append(data, size); }
+  void Add(const char* data, std::size_t size) {
+    pending_.erase(0, std::exchange(taken_, 0));  // once for many small messages
+    pending_.append(data, size);
+  }
   // The next message that is whole. Throws BadMessage; then the stream is worth nothing more.
   std::optional<Message> Next();
 
  private:
   std::string pending_;
+  std::size_t taken_ = 0;  // bytes at its front
 };
 
 }  // namespace calmframe::studio

@@ -1,7 +1,9 @@
 #include <gmock/gmock.h>
 
 #include <atomic>
+#include <cstdint>
 #include <cstdlib>
+#include <limits>
 #include <string>
 #include <thread>
 
@@ -46,6 +48,10 @@ TEST(LibraryMisuseTest, OptionsThatThereAreNot) {
       {"aspect", [](auto& o) { o.aspect_num = -1; }},
       {"field order", [](auto& o) { o.field_order = 3; }},
       {"where frames are fetched", [](auto& o) { o.shots = CALMFRAME_SHOTS_FOUND; }},
+      {"too many shot_starts",
+       [](auto& o) {
+         o.shots = CALMFRAME_SHOTS_LIST, o.shot_starts = starts, o.shot_start_count = SIZE_MAX;
+       }},
       {"ascend",
        [](auto& o) {
          o.shots = CALMFRAME_SHOTS_LIST, o.shot_starts = starts, o.shot_start_count = 2;
@@ -117,6 +123,8 @@ TEST(LibraryMisuseTest, FramesOutOfOrderAndOfAnotherSize) {
   refuse("161 by 120", [](calmframe_image& i) { i.width = 161; });
   refuse("plane 0 is null", [](calmframe_image& i) { i.plane[0] = nullptr; });
   refuse("639 apart", [](calmframe_image& i) { i.stride[0] = 639; });
+  constexpr std::ptrdiff_t kLeast = std::numeric_limits<std::ptrdiff_t>::min();
+  refuse("apart", [](calmframe_image& i) { i.stride[0] = kLeast; });
   std::int32_t state;
   ASSERT_EQ(calmframe_get_state(session, &state), CALMFRAME_OK);
   EXPECT_EQ(state, CALMFRAME_IDLE) << "nothing of it began the work";
@@ -136,6 +144,14 @@ TEST(LibraryMisuseTest, FramesOutOfOrderAndOfAnotherSize) {
   EXPECT_EQ(calmframe_render(session, -1, &image, &image), CALMFRAME_ERROR_ARGUMENT);
   EXPECT_EQ(calmframe_render(session, 0, nullptr, &image), CALMFRAME_ERROR_ARGUMENT);
   EXPECT_EQ(calmframe_render(session, 0, &image, nullptr), CALMFRAME_ERROR_ARGUMENT);
+  calmframe_place place;
+  for (const auto& [first, frames] : {std::pair<std::int64_t, std::int64_t>(1, INT64_MAX),
+                                      {INT64_MAX, 1},
+                                      {24, 1},
+                                      {-1, 1},
+                                      {0, -1}}) {
+    EXPECT_EQ(calmframe_get_path(session, first, frames, &place), CALMFRAME_ERROR_ARGUMENT);
+  }
   calmframe_shot shot;
   EXPECT_EQ(calmframe_get_shot(session, 1, &shot), CALMFRAME_ERROR_ARGUMENT);
   EXPECT_EQ(calmframe_get_shot(session, 0, nullptr), CALMFRAME_ERROR_ARGUMENT);
@@ -243,7 +259,7 @@ TEST(LibraryMisuseTest, CallsFromTheFetchingFunction) {
   struct Caller {
     Street* street;
     calmframe_session session = nullptr;
-    calmframe_result closed = 0, waited = 0, asked = -1;
+    calmframe_result closed = 0, waited = 0, asked = -1, path = 0, saved = 0;
   } caller{&street};
   calmframe_options options = street.Fetching();
   const calmframe_fetch fetch = options.fetch;
@@ -256,11 +272,19 @@ TEST(LibraryMisuseTest, CallsFromTheFetchingFunction) {
     c.closed = calmframe_close(c.session);
     c.waited = calmframe_wait(c.session, -1);
     c.asked = calmframe_get_state(c.session, &state);
+    calmframe_place place;
+    c.path = calmframe_get_path(c.session, 0, 1, &place);
+    c.saved = calmframe_save_file(c.session, "/nowhere/saved.calm");
     return fetch_street(c.street, frame, image);
   };
   const Opened session(options);
   caller.session = session;
   session.Solve();
+  // Once solved, a call that waits for the session's threads would wait for this one.
+  const calmframe_image out = street.Image(20);
+  ASSERT_EQ(calmframe_render(session, 20, nullptr, &out), CALMFRAME_OK) << session.Text();
+  EXPECT_EQ(caller.path, CALMFRAME_ERROR_STATE);
+  EXPECT_EQ(caller.saved, CALMFRAME_ERROR_STATE);
   EXPECT_EQ(caller.closed, CALMFRAME_ERROR_STATE);
   EXPECT_EQ(caller.waited, CALMFRAME_ERROR_STATE);
   EXPECT_EQ(caller.asked, CALMFRAME_OK);

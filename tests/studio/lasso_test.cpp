@@ -14,7 +14,7 @@ using testing::IsEmpty;
 // A frame of 100 x 50, three slots, four rows from frame 10 on. Slot 0: a track that walks right,
 // 20 pixels a row. Slot 1: one that stands at (50, 25) for two rows, then another one at (9, 9).
 // Slot 2: one that is deleted, and behind it none.
-host::SolvedClip Clip() {
+host::SolvedClip Tracked() {
   host::SolvedClip clip;
   clip.source_width = 100;
   clip.source_height = 50;
@@ -29,7 +29,8 @@ host::SolvedClip Clip() {
 
 std::vector<TrackPoint> Points(const Lasso& lasso, int fields = 1) {
   std::vector<TrackPoint> points;
-  for (const LassoedTrack& track : TracksIn(lasso, Clip(), fields)) points.push_back(track.point);
+  for (const LassoedTrack& track : TracksIn(lasso, Tracked(), fields))
+    points.push_back(track.point);
   return points;
 }
 
@@ -46,7 +47,7 @@ TEST(LassoTest, HoldsWhatIsInsideInItsFrameOrInAny) {
   EXPECT_THAT(Points({-1000000000000, all}), IsEmpty());
   // Of an interlaced clip frame 5 is the first two rows.
   EXPECT_THAT(Points({5, all}, 2), ElementsAre(TrackPoint{10, 0}, TrackPoint{10, 1}));
-  const auto found = TracksIn({10, right}, Clip(), 1);
+  const auto found = TracksIn({10, right}, Tracked(), 1);
   EXPECT_EQ(found[0].place, (host::Point{0.5, 0.5}));
 }
 

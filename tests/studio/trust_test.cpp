@@ -11,7 +11,7 @@ TEST(StudioTrustTest, HostsThatAPersonMayTypeAndNoOthers) {
   // A name of somebody else may stand for this machine by now.
   for (const char* host :
        {"", "evil.example", "evil.example:8080", "localhost.evil.example", "127.0.0.1.evil.example",
-        "[", "[evil]:1", "127.0.0.1x", "studio.home.", ":8080"}) {
+        "[", "[evil]:1", "[::1].evil.example:1", "127.0.0.1x", "studio.home.", ":8080"}) {
     EXPECT_FALSE(IsOwnHost(host, "studio.home")) << host;
   }
   EXPECT_FALSE(IsOwnHost("studio.home", ""));
@@ -28,9 +28,13 @@ TEST(StudioTrustTest, OriginsAreThePageItself) {
 }
 
 TEST(StudioTrustTest, CookiesAndFieldsOfDamagedText) {
-  EXPECT_EQ(CookieOf("a=1; c_80=secret; b=2", "c_80"), "secret");
-  EXPECT_EQ(CookieOf("xc_80=no;c_80", "c_80"), "");
-  EXPECT_EQ(CookieOf(";;=;c_80=a=b", "c_80"), "a=b");
+  EXPECT_TRUE(BringsCookie("a=1; c_80=secret; b=2", "c_80", "secret"));
+  EXPECT_TRUE(BringsCookie("c_80=another's; c_80=secret", "c_80", "secret"));
+  EXPECT_TRUE(BringsCookie(";;=;c_80=a=b", "c_80", "a=b"));
+  for (const char* header : {"", "xc_80=secret;c_80", "c_80=secre", "c_80=secret2", "c_80="}) {
+    EXPECT_FALSE(BringsCookie(header, "c_80", "secret")) << header;
+  }
+  EXPECT_FALSE(BringsCookie("c_80=", "c_80", ""));
   EXPECT_EQ(FieldOf("path=%2Fa+b%2f%C3%A9&x=1", "path"), "/a b/\xC3\xA9");
   EXPECT_EQ(FieldOf("x=1&path=", "path"), "");
   // Cut, no digits, and a zero that would end a name early.

@@ -53,7 +53,8 @@ TEST(BatchNamesTest, FoldersOfTasksAreSafeAndApart) {
         << id;
     EXPECT_TRUE(ids.insert(id).second) << id;
   }
-  EXPECT_EQ(Shown("a\nb\t\x1b[2J\x7f\"'.mp4"), "a\\nb\\t\\x1b[2J\\x7f\"'.mp4");
+  EXPECT_EQ(Shown("a\nb\t\x1b[2J\x7f\"'\u00a1.mp4"), "a\\nb\\t\\x1b[2J\\x7f\"'\u00a1.mp4");
+  EXPECT_EQ(Shown("\u009b2J\xc2"), "\\u009b2J\xc2");
 }
 
 class BatchPlanTest : public ::testing::Test, protected ScratchFolder {

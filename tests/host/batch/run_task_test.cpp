@@ -1,6 +1,9 @@
 #include "host/batch/run_task.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <filesystem>
@@ -16,6 +19,7 @@ namespace fs = std::filesystem;
 using State = TaskResult::State;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
+using ::testing::Not;
 
 class Silent final : public TaskWatcher {
  public:
@@ -114,6 +118,22 @@ TEST_F(RunTaskTest, WhatIsNotTheBatchsStays) {
   fs::remove(In("out/x-s.mp4"));
   fs::create_directory(In("out/x-s.mp4"));
   ExpectFailed(Run(task), kOutputCode, "is not a file on disk");
+  // A record that whoever else may write there has made to hold it up.
+  fs::remove(In("out/x-s.mp4"));
+  fs::remove(plan.FolderOf(task).record());
+  ASSERT_EQ(mkfifo(plan.FolderOf(task).record().c_str(), 0600), 0);
+  Does("");
+  EXPECT_EQ(Run(task).state, State::done);
+}
+
+TEST_F(RunTaskTest, ProgramsInheritNoFileThatIsOpen) {
+  const Task task = Clip("x.mp4");
+  const int open_here = open(In("x.mp4").c_str(), O_RDONLY);  // and would stay open
+  Does("ls -l /proc/$$/fd >'" + In("open") + "'");
+  EXPECT_EQ(Run(task).state, State::done);
+  close(open_here);
+  EXPECT_THAT(Content("open"), HasSubstr("/lock"));
+  EXPECT_THAT(Content("open"), Not(HasSubstr("x.mp4")));
 }
 
 TEST_F(RunTaskTest, FailuresAreOneLineAndLeaveNoOutput) {

@@ -187,7 +187,9 @@ TEST_F(ProjectTest, TablesThatComputeWhatTheyHoldAreDamage) {
         " (SELECT 1 UNION ALL SELECT bytes + 1 FROM n) SELECT count(*) AS bytes FROM n",
         "ALTER TABLE shot ADD COLUMN more AS (hex(zeroblob(400000000)))",
         "CREATE VIRTUAL TABLE more USING rtree (a, b, c)",
-        "CREATE TRIGGER more AFTER INSERT ON shot BEGIN SELECT 1; END"}) {
+        "CREATE TRIGGER more AFTER INSERT ON shot BEGIN SELECT 1; END",
+        "CREATE INDEX more ON shot (hex(instance))",
+        "CREATE TABLE analysis (start_frame, number, bytes CHECK (bytes LIKE '%a%a%a%a%a%b'))"}) {
     SCOPED_TRACE(sql);
     const std::string path = In("computed.calm");
     std::filesystem::remove(path);
@@ -200,6 +202,30 @@ TEST_F(ProjectTest, TablesThatComputeWhatTheyHoldAreDamage) {
     EXPECT_THAT([&] { SaveProject(path, Sample(1, 10)); }, IsRefused("is damaged"));
     EXPECT_EQ(ProjectKeeper(path, 0).Find(0), nullptr);
   }
+}
+
+// SQLite removes the journal of several databases that a journal names, once that is taken back.
+TEST_F(ProjectTest, AStrangersJournalRemovesNoFile) {
+  const std::string path = In("walk.calm"), precious = In("precious");
+  SaveProject(path, Sample(1, 10));
+  MakeFile("precious", "mine");
+  const auto number = [](std::size_t value) {
+    std::string bytes;
+    for (const int shift : {24, 16, 8, 0}) bytes += static_cast<char>(value >> shift & 0xff);
+    return bytes;
+  };
+  const std::string magic = "\xd9\xd5\x05\xf9\x20\xa1\x63\xd7";
+  constexpr std::size_t kPage = 4096, kSector = 512;
+  std::string journal = magic + number(0) + number(1) + number(fs::file_size(path) / kPage) +
+                        number(kSector) + number(kPage);
+  journal.resize(kSector);
+  std::size_t sum = 0;
+  for (const char c : precious) sum += static_cast<unsigned char>(c);
+  journal += number((std::size_t{1} << 30) / kPage + 1) + precious + number(precious.size()) +
+             number(sum) + magic;
+  MakeFile("walk.calm-journal", journal);
+  EXPECT_THAT([&] { LoadProject(path); }, IsRefused("is damaged"));
+  EXPECT_EQ(Content("precious"), "mine");
 }
 
 TEST_F(ProjectTest, WhatNoClipOnALayerTellsIsDamage) {

@@ -42,6 +42,8 @@ TEST(ShotListTest, NamesBreakNoForm) {
             "clip,shot,first_frame,end_frame,begins,ends,how\r\n"
             "\"a \"\"b\"\",\nc.mp4\",1,0,50,0.000,2.000,start\r\n"
             "\"a \"\"b\"\",\nc.mp4\",2,50,61,2.000,2.440,dissolve\r\n");
+  // Not to be computed.
+  EXPECT_THAT(CsvOf({"=1+1.mp4", 25, 1}, shots), HasSubstr("\r\n\"'=1+1.mp4\",1,"));
   EXPECT_THAT(EdlOf(film, shots), HasSubstr("TITLE: a \"b\",_c.mp4\nFCM"));
   EXPECT_EQ(JsonOf(film, shots)["shots"][1]["begins"], 2.0);
 }

@@ -1,0 +1,153 @@
+#include <gmock/gmock.h>
+
+#include <boost/asio/io_context.hpp>
+#include <chrono>
+#include <filesystem>
+#include <nlohmann/json.hpp>
+
+#include "studio/server/studio.h"
+#include "studio/wire/message.h"
+#include "tests/support/scratch_folder.h"
+
+namespace calmframe::studio {
+namespace {
+
+namespace fs = std::filesystem;
+using nlohmann::json;
+
+// A studio whose workers are what a clip may have made of one: a script that says what the test has
+// it say, hears nothing, and doesn't end when it is asked to.
+class StudioWorkerTest : public testing::Test, protected ScratchFolder {
+ protected:
+  StudioWorkerTest() {
+    fs::create_directories(In("clips"));
+    for (const char* clip : {"clips/one.mp4", "clips/two.mp4"}) MakeFile(clip, "x");
+    MakeFile("worker", "#!/bin/bash\ntrap '' TERM\ncat \"$0.says\" >&\"$1\"\nsleep 60 & wait\n");
+    fs::permissions(In("worker"), fs::perms::owner_all);
+    Start("");
+  }
+  ~StudioWorkerTest() override { studio_->StopAll(); }
+
+  void Start(const std::string& says) {
+    if (studio_) studio_->StopAll();
+    studio_.reset();
+    MakeFile("worker.says", says);
+    studio_ = std::make_unique<Studio>(
+        context_, StudioSettings{In("worker"), {}, {In("clips")}, In("session")});
+    one_ = studio_->Add(In("clips/one.mp4"));
+    two_ = studio_->Add(In("clips/two.mp4"));
+  }
+  json All() {
+    json all;
+    studio_->StopListening(
+        studio_->Listen([&all](const auto& event) { all = json::parse(*event); }));
+    return all;
+  }
+  json State() { return All()["clips"][one_]; }
+  // The answer, null where none has come yet.
+  json Do(json request) {
+    const auto answer = std::make_shared<json>();
+    if (!request.contains("clip")) request["clip"] = one_;
+    studio_->Do(request, [answer](json said) { *answer = std::move(said); });
+    return *answer;
+  }
+  // Whether it comes so far. Nothing that a handler throws is caught.
+  template <class Condition>
+  bool Comes(const Condition& condition) {
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    while (!condition() && std::chrono::steady_clock::now() < end) {
+      context_.restart();
+      context_.run_for(std::chrono::milliseconds(10));
+    }
+    return condition();
+  }
+
+  boost::asio::io_context context_{1};
+  std::unique_ptr<Studio> studio_;
+  std::string one_, two_;
+};
+
+TEST_F(StudioWorkerTest, WhatMakesNoSenseEndsTheWorkerAndNothingElse) {
+  std::vector<std::string> lies = {std::string("\xff\xff\xff\xff\0\0\0\0", 8)};
+  for (const char* lie :
+       {R"({"tells": {"state": 5}})", R"({"tells": {"error": {}}})", R"({"tells": 7})",
+        R"({"tells": {"path": 1}})", R"({"tells": {"settings": []}})",
+        R"({"tells": {"settings": {"controls": {"20": 1e300}}}})", R"({"id": 1, "error": 7})",
+        R"({"id": "1"})", R"({"id": 1, "why": ["busy"]})"}) {
+    lies.push_back(Encode({json::parse(lie), ""}));
+  }
+  for (const std::string& lie : lies) {
+    SCOPED_TRACE(lie);
+    Start(lie);
+    EXPECT_EQ(Do({{"op", "open"}}), json::object());
+    json picture;
+    ASSERT_TRUE(studio_->Ask(one_, {{"op", "frame"}},
+                             [&picture](const Message& answer) { picture = answer.head; }));
+    ASSERT_TRUE(Comes([&] { return State()["state"] == "failed"; })) << State();
+    EXPECT_TRUE(picture.contains("error")) << picture;
+    EXPECT_EQ(State()["settings"]["controls"], json::object());
+  }
+}
+
+TEST_F(StudioWorkerTest, WhatIsToldOfAClipChangesNoOtherAndIsNotKeptWhereItCantBeRead) {
+  Start(Encode({json::parse(R"({"tells": {"state": "ready", "outcome": [1], "picture": -1e300,
+                   "warnings": 7, "id": "x", "shots": [{"choice": {"candidates": [
+                   7, {"changes": {"99999999999": 1}}, {"taken": true, "changes": {"20": 1e300}}]}}]}})"),
+                ""}));
+  Do({{"op", "open"}});
+  ASSERT_TRUE(Comes([&] { return State()["state"] == "ready"; }));
+  for (const char* way : {"0", "1", "2", "3"}) {
+    EXPECT_TRUE(Do({{"op", "way"}, {"way", json::parse(way)}}).contains("error")) << way;
+  }
+  EXPECT_TRUE(Do({{"op", "control"}, {"control", 28}, {"value", 2}}).contains("error"));
+  EXPECT_EQ(State()["id"], one_);
+  EXPECT_EQ(Do({{"op", "control"}, {"clip", two_}, {"control", 28}, {"value", 2}}), json::object());
+  Start("");
+  EXPECT_EQ(All()["clips"][two_]["settings"]["controls"]["28"], 2.0);
+  EXPECT_EQ(All()["order"].size(), 2u);
+}
+
+TEST_F(StudioWorkerTest, WhoeverWaitsForItHearsOfItsEnd) {
+  json lassoed, saved;
+  const auto wait_for = [this](const char* op, json& said) {
+    studio_->Do({{"op", op}, {"clip", one_}, {"frame", 0}, {"path", In("clips/w.calm")}},
+                [&said](json answer) { said = std::move(answer); });
+  };
+  // Of a clip ahead of another.
+  wait_for("lasso", lassoed);
+  wait_for("save", saved);
+  EXPECT_EQ(Do({{"op", "remove"}}), json::object());
+  EXPECT_TRUE(lassoed.contains("error") && saved.contains("error")) << lassoed << saved;
+  // A render that waits for work that is never saved is let go, and the next one has its turn.
+  const auto states = [this] {
+    std::string told;
+    const json all = All();
+    for (const json& job : all["renders"]) told += job["state"].get<std::string>() + " ";
+    return told;
+  };
+  for (const char* name : {"clips/a.mp4", "clips/b.mp4"}) {
+    EXPECT_EQ(Do({{"op", "render"}, {"clip", two_}, {"path", In(name)}}), json::object());
+  }
+  EXPECT_EQ(states(), "saving waiting ");
+  Do({{"op", "end render"}, {"render", 1}});
+  EXPECT_EQ(states(), "cancelled saving ");
+  // With this the studio ends.
+}
+
+TEST_F(StudioWorkerTest, ANewPasswordLetsNobodyInWhoHadTheOldOne) {
+  const auto secret = [this](const std::string& password) {
+    studio_->StopAll();
+    studio_.reset();
+    studio_ = std::make_unique<Studio>(
+        context_, StudioSettings{In("worker"), {}, {In("clips")}, In("session"), password});
+    return studio_->secret();
+  };
+  const std::string none = secret(""), first = secret("password one");
+  EXPECT_EQ(secret("password one"), first);
+  const std::string second = secret("password two"), again = secret("");
+  EXPECT_EQ(std::set<std::string>({none, first, second, again}).size(), 4u);
+  EXPECT_EQ(secret(""), again);
+}
+
+}  // namespace
+}  // namespace calmframe::studio
