@@ -206,8 +206,12 @@ SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium, cons
   if (!effect_->creation().ok()) throw SolveFailure(effect_->creation().Line(path()));
   // Saved work keeps what it was made with.
   if (!shot) Set(HX_TRANSITION_BISQUARE_SIGMA.disk_id, kTransitionBisquareSigma);
-  if (shot) choice_ = Choice::Parse(shot->choice);
-  if (choice_) held_ = choice_->still;
+  if (shot) {
+    choice_ = Choice::Parse(shot->choice);
+    LeftOut left_out = LeftOutIn(shot->choice);
+    held_ = left_out.still;
+    deleted_ = std::move(left_out.deleted);
+  }
   knows_deleted_ = !shot || held_ != Still::all;
 } catch (const PluginError& error) {
   throw SolveFailure(error.what());
@@ -811,7 +815,8 @@ SavedShot SteadyClip::Saved() {
   const auto layer = effect_->shared()->layer()->state();
   shot.start_frame = layer->start_frame;
   shot.length = layer->length;
-  if (choice_) shot.choice = choice_->Json().dump();
+  // Known by now, where a group is left out.
+  shot.choice = TextOf(choice(), {held_, held_ == Still::all ? std::set<TrackPoint>() : deleted_});
   has_new_choice_ = false;
   return shot;
 }

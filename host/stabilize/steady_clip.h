@@ -141,8 +141,7 @@ class SteadyClip {
   // Effect::DeleteTracks takes them. What is solved without them is there after the next Work, and
   // a choice that was made before is undone. Throws SolveFailure.
   void DeleteTracks(const std::set<TrackPoint>& points);
-  // The same as they are; of saved work those that it holds, unless tracks of a group are left out
-  // of it, which can't be told apart from them. An analysis forgets them.
+  // The same as they are; of saved work those that it holds. An analysis forgets them.
   const std::set<TrackPoint>& DeletedTracks();
   // Null where nothing was to choose.
   const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }
@@ -242,7 +241,7 @@ class SteadyClip {
   std::optional<Choice> choice_;
   bool has_new_choice_ = false;
   std::set<TrackPoint> deleted_;      // by a person
-  bool knows_deleted_ = true;         // else saved work may hold some
+  bool knows_deleted_ = true;         // else all that saved work leaves out
   std::vector<TrackPoint> left_out_;  // of a group
   Effect* with_tracks_ = nullptr;     // the session's
   Still held_ = Still::all;           // as a choice or HoldStill has it
