@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "apps/calmframe/command.h"
+#include "apps/calmframe/sample_clip.h"
 #include "apps/calmframe/stabilize_command.h"
 
 namespace calmframe {
@@ -19,7 +20,7 @@ class DemoCommand final : public Command {
 
  private:
   std::string directory_ = "calmframe-demo";
-  int frames_ = 240;
+  int frames_ = kSampleFrames;
   ControlFlags controls_;
   OutputFlags flags_;
   RunFlags run_;

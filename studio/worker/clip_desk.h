@@ -13,6 +13,7 @@
 #include <string>
 #include <vector>
 
+#include "host/media/clip.h"
 #include "host/stabilize/film.h"
 #include "studio/wire/settings.h"
 #include "studio/worker/frame_desk.h"
@@ -68,6 +69,9 @@ class ClipDesk {
   std::vector<LassoedTrack> TracksIn(const Lasso& lasso);
   // Somebody looks at that frame.
   void LookAt(std::int64_t frame);
+  // Why the clip can't be written to a file like that, one line; empty where it can, or isn't open
+  // yet. Nothing is left there.
+  std::string OutputTrouble(const std::string& path, const media::EncodeSettings& encode);
 
   void Run();
 
@@ -112,6 +116,7 @@ class ClipDesk {
   void ForgetDeleted();
   void KeepResult(host::SteadyClip& shot, std::uint64_t version, bool solved);
   void SaveNow(const SaveRequest& request);
+  void TellInfo();
   void TellPanel(host::SteadyClip& shot);
   void TellShots();
   void TellPicture();
@@ -142,6 +147,7 @@ class ClipDesk {
   std::chrono::steady_clock::time_point steady_at_;
   std::optional<std::int64_t> looked_at_;
   bool wants_tracks_ = false;
+  std::optional<media::ClipInfo> info_;            // none: it isn't open
   int fields_ = 1;                                 // that a frame is of
   std::shared_ptr<const host::MovingClip> found_;  // of the shot that is shown; may be null
   std::deque<SaveRequest> saves_;
