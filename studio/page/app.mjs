@@ -32,7 +32,7 @@ function useTheme() {
 }
 
 function Strip({clip, seek}) {
-  if (!clip.picture || !clip.info) return html`<div class="strip"></div>`;
+  if (!clip.picture || !clip.info) return null;
   const count = 12, last = clip.info.frames - 1;
   return html`<div class="strip" aria-hidden="true">${Array.from({length: count}, (_, i) => {
     const frame = Math.round(last * i / (count - 1));
@@ -58,14 +58,14 @@ function Transport({clip, frame, transport, update, mode, setMode}) {
                aria-valuetext=${info ? timeText(frame / info.rate) : ''} onInput=${(event) => update({seek: Number(event.target.value)})} />
       </div>
       <div class="keys">
-        <button class="round" aria-label=${T.stepBack} title=${T.stepBack} onClick=${() => update({step: -1})}>${ICONS.back}</button>
-        <button class="round primary" aria-label=${transport.speed ? T.pause : T.play} title=${T.keys} onClick=${() => update({toggle: true})}>${transport.speed ? ICONS.pause : ICONS.play}</button>
-        <button class="round" aria-label=${T.stepOn} title=${T.stepOn} onClick=${() => update({step: 1})}>${ICONS.on}</button>
+        <button class="round" disabled=${!info} aria-label=${T.stepBack} title=${T.stepBack} onClick=${() => update({step: -1})}>${ICONS.back}</button>
+        <button class="round primary" disabled=${!info} aria-label=${transport.speed ? T.pause : T.play} title=${T.keys} onClick=${() => update({toggle: true})}>${transport.speed ? ICONS.pause : ICONS.play}</button>
+        <button class="round" disabled=${!info} aria-label=${T.stepOn} title=${T.stepOn} onClick=${() => update({step: 1})}>${ICONS.on}</button>
         <output>${info ? timeText(frame / info.rate) : '0:00.00'} <i>/ ${info ? timeText(info.frames / info.rate) : '0:00.00'} · ${frame}</i></output>
         <span class="gap"></span>
         ${range && html`<button class="quiet" onClick=${() => update({range: null})}>${T.clearRange}</button>`}
-        <button class="quiet" title="I" onClick=${() => update({mark: 'in'})}>${T.inPoint}</button>
-        <button class="quiet" title="O" onClick=${() => update({mark: 'out'})}>${T.outPoint}</button>
+        <button class="quiet" disabled=${!info} title="I" onClick=${() => update({mark: 'in'})}>${T.inPoint}</button>
+        <button class="quiet" disabled=${!info} title="O" onClick=${() => update({mark: 'out'})}>${T.outPoint}</button>
         <label class="quiet"><input type="checkbox" checked=${transport.loop} onChange=${(event) => update({loop: event.target.checked})} /> ${T.loop}</label>
       </div>
     </div>`;

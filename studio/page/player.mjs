@@ -145,7 +145,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
     let ended = false, timer = 0;
     let shown = null, started = null, lastSpeed = 0, rate = [], drawn = '';
     // While it plays: pictures that don't come in time are made smaller, then every so many frames are left out.
-    let narrow = false, stride = 1, slot = -1, hits = 0, since = 0;
+    let narrow = false, stride = 1, slot = -1, seen = 0, hits = 0, since = 0;
     let asked = '', restAt = 0;  // of what is changed by hand
     engine.pictures = new Pictures(() => engine.work());
 
@@ -158,7 +158,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
         rate = [];
         narrow = false;
         stride = 1;
-        hits = 0;
+        seen = hits = 0;
         since = now + 300;  // what is at the start has no time to be there
       }
       if (!how.speed) return;
@@ -187,17 +187,21 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
       const present = Math.floor(how.frame / by) * by;
       if (present !== slot) {
         slot = present;
-        if (now > since && held.has(address(slot, wide))) ++hits;
+        if (now > since) {
+          ++seen;
+          if (held.has(address(slot, wide))) ++hits;
+        }
       }
       if (now > since + 1000) {
         const due = (now - since) / 1000 * of.info.rate * Math.abs(how.speed) / by;
-        if (hits < 0.8 * due) {
+        // Late pictures, or a screen that has no time to show as many.
+        if (hits < 0.8 * seen || seen < 0.6 * due) {
           if (!narrow && less < wide) narrow = true;
           else if (stride < 8) ++stride;
         } else if (hits > 0.95 * due && stride > 1) {
           --stride;
         }
-        hits = 0;
+        seen = hits = 0;
         since = now;
       }
       const list = [];
