@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "apps/calmframe/flags.h"
+#include "apps/calmframe/sample_clip.h"
 #include "host/media/clip.h"
 
 namespace calmframe {

@@ -4,7 +4,6 @@
 #include <vector>
 
 #include "apps/calmframe/command.h"
-#include "apps/calmframe/sample_clip.h"
 #include "apps/calmframe/stabilize_command.h"
 
 namespace calmframe {
@@ -20,7 +19,7 @@ class DemoCommand final : public Command {
 
  private:
   std::string directory_ = "calmframe-demo";
-  int frames_ = kSampleFrames;
+  int frames_ = 240;
   ControlFlags controls_;
   OutputFlags flags_;
   RunFlags run_;

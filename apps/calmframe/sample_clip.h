@@ -7,8 +7,6 @@
 
 namespace calmframe {
 
-inline constexpr int kSampleFrames = 240;
-
 // Draws a walk down a street with the camera held in the hand, so many frames of 1280x720, 30 a
 // second, and shows that as the stage "drawing". The same number gives the same frames. threads: 0
 // for all processors. Throws Interrupted, media::Failure (output); then nothing is left at `path`.

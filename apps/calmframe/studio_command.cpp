@@ -176,7 +176,8 @@ StudioSampleCommand::StudioSampleCommand(CLI::App& program)
 
 void StudioSampleCommand::Run() {
   ProgressLine progress(ProgressLine::Form::json);
-  DrawSample(output_, kSampleFrames, {}, 0, progress);
+  constexpr int kFrames = 120;  // a person waits for them
+  DrawSample(output_, kFrames, {}, 0, progress);
 }
 
 }  // namespace calmframe
