@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <nlohmann/json.hpp>
@@ -158,6 +159,8 @@ class ClipDesk {
   std::unique_ptr<host::Film> film_;
   bool whole_ = false;       // all shots were worked
   std::vector<Shot> shots_;  // those that were
+  // Who was asked to stand still when a shot's window was chosen, by the shot's number.
+  std::map<std::size_t, host::Still> asked_still_;
   // Controls that were ever set, and those that are on the open shot.
   std::set<std::int32_t> touched_, applied_;
   std::vector<std::string> warnings_;

@@ -40,6 +40,7 @@ void ClipDesk::OpenClip(const OpenRequest& request) {
   frames_.Hide();
   film_.reset();
   shots_.clear();
+  asked_still_.clear();
   whole_ = false;
   error_.clear();
   warnings_.clear();
