@@ -180,6 +180,7 @@ int Run(int argc, char** argv) {
   TracksCommand tracks(program);
   ReportCommand report(program);
   StudioWorkerCommand studio_worker(program);
+  StudioSampleCommand studio_sample(program);
   BatchJobCommand batch_job(program);
   BatchGlancesCommand batch_glances(program);
   BatchPicturesCommand batch_pictures(program);
@@ -190,11 +191,12 @@ int Run(int argc, char** argv) {
   WriteCommand bash(program, "write-bash-completion", manual::BashCompletion);
   WriteCommand zsh(program, "write-zsh-completion", manual::ZshCompletion);
   WriteCommand fish(program, "write-fish-completion", manual::FishCompletion);
-  Command* const commands[] = {
-      &stabilize,     &studio,         &batch,       &demo,      &analyze,       &params, &shots,
-      &render,        &info,           &tracks,      &report,    &gather,        &join,   &man_page,
-      &batch_glances, &batch_pictures, &batch_shots, &batch_job, &studio_worker, &bash,   &zsh,
-      &fish};
+  Command* const commands[] = {&stabilize,   &studio,    &batch,         &demo,
+                               &analyze,     &params,    &shots,         &render,
+                               &info,        &tracks,    &report,        &gather,
+                               &join,        &man_page,  &batch_glances, &batch_pictures,
+                               &batch_shots, &batch_job, &studio_worker, &studio_sample,
+                               &bash,        &zsh,       &fish};
   char help_flag[] = "--help";
   if (argc > 1 && std::string(argv[1]) == "help") {
     argv[1] = argc > 2 ? argv[2] : help_flag;

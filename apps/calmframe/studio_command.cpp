@@ -17,6 +17,7 @@
 #include "apps/calmframe/failures.h"
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/plugin_path.h"
+#include "apps/calmframe/sample_clip.h"
 #include "host/media/clip.h"
 #include "studio/server/server.h"
 #include "studio/worker/worker.h"
@@ -28,7 +29,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr char kWorker[] = "studio-worker", kWorkerFolder[] = "--in";
+constexpr char kWorker[] = "studio-worker", kWorkerFolder[] = "--in", kSample[] = "studio-sample";
 
 std::string Environment(const char* name) {
   const char* const value = std::getenv(name);
@@ -121,6 +122,7 @@ void StudioCommand::Run() {
   std::error_code error;
   settings.studio.program = fs::read_symlink("/proc/self/exe", error);
   settings.studio.worker = {kWorker};
+  settings.studio.sample = {kSample};
   settings.studio.folder = session_.empty() ? SessionFolder() : fs::absolute(session_).string();
   settings.studio.roots = roots_;
   for (const std::string& clip : clips_) {
@@ -165,6 +167,17 @@ void StudioWorkerCommand::Run() {
   fcntl(socket_, F_SETFD, FD_CLOEXEC);
   Confinement{.folders = folders_}.Begin();
   studio::RunWorker(socket_, PluginPath());
+}
+
+StudioSampleCommand::StudioSampleCommand(CLI::App& program)
+    : Command(*program.add_subcommand(kSample)->group("")) {
+  parser_.add_option("OUT", output_)->required();
+}
+
+void StudioSampleCommand::Run() {
+  ProgressLine progress(ProgressLine::Form::json);
+  constexpr int kFrames = 120;  // a person waits for them
+  DrawSample(output_, kFrames, {}, 0, progress);
 }
 
 }  // namespace calmframe

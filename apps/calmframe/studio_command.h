@@ -31,4 +31,15 @@ class StudioWorkerCommand final : public Command {
   std::vector<std::string> folders_;  // that it may read and write
 };
 
+// What it starts where a clip to try is asked for, `calmframe studio-sample OUT`; in no list.
+class StudioSampleCommand final : public Command {
+ public:
+  explicit StudioSampleCommand(CLI::App& program);
+  bool json() const override { return true; }
+  void Run() override;
+
+ private:
+  std::string output_;
+};
+
 }  // namespace calmframe

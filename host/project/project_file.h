@@ -19,8 +19,8 @@ namespace calmframe::host {
 struct SavedShot {
   std::int32_t start_frame = 0, length = 0;  // of the layer; see LayerState
   SavedEffect effect;
-  // JSON: what was chosen for the shot besides the controls; empty: nothing. See stabilize's
-  // Choice.
+  // JSON: what was chosen for the shot besides the controls, and what tracks a person deleted
+  // beside those of a group; empty: neither. See stabilize's Choice and LeftOut.
   std::string choice;
 };
 

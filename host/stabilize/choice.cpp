@@ -153,6 +153,38 @@ std::optional<Choice> Choice::Parse(const std::string& text) {
   }
 }
 
+std::string TextOf(const Choice* choice, const LeftOut& left_out) {
+  const bool holds = left_out.still != Still::all;
+  if (!choice && !holds) return "";
+  nlohmann::ordered_json object;
+  if (choice) object = choice->Json();
+  if (holds) object["still"] = kStills[static_cast<std::size_t>(left_out.still)];
+  if (holds && (!choice || !left_out.deleted.empty())) {
+    object["deleted"] = nlohmann::ordered_json::array();
+    for (const TrackPoint& point : left_out.deleted) {
+      object["deleted"].push_back({point.frame, point.slot});
+    }
+  }
+  return object.dump();
+}
+
+LeftOut LeftOutIn(const std::string& text) {
+  LeftOut left_out;
+  try {
+    const nlohmann::json object = nlohmann::json::parse(text);
+    for (const Still still : {Still::background, Still::subject}) {
+      if (object.at("still") == kStills[static_cast<std::size_t>(still)]) left_out.still = still;
+    }
+    if (left_out.still == Still::all) return left_out;
+    for (const nlohmann::json& point : object.value("deleted", nlohmann::json::array())) {
+      const TrackPoint at{point.at(0).get<std::int32_t>(), point.at(1).get<std::int32_t>()};
+      if (at.frame >= 0 && at.slot >= 0) left_out.deleted.insert(at);
+    }
+  } catch (const std::exception&) {  // what could be read stands
+  }
+  return left_out;
+}
+
 Chooser::Chooser(const MovingClip& clip, const FollowSettings& settings,
                  const ChoiceWeights& weights)
     : settings_(settings),

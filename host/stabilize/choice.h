@@ -3,10 +3,12 @@
 #include <cstdint>
 #include <nlohmann/json_fwd.hpp>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
 #include "host/effects/param_table.h"
+#include "host/effects/track_point.h"
 #include "host/stabilize/moving_clip.h"
 #include "host/stabilize/outcome.h"
 
@@ -66,6 +68,19 @@ struct Choice {
   // None of what is no choice.
   static std::optional<Choice> Parse(const std::string& text);
 };
+
+// Who stands still in a shot, and the tracks that a person has deleted besides: of what an effect
+// has left out it doesn't tell those from a group's.
+struct LeftOut {
+  Still still = Still::all;      // never automatic
+  std::set<TrackPoint> deleted;  // where still is all: empty, and all that is left out
+};
+
+// As SavedShot has both: a choice, which may be null, as it is by itself unless something stands
+// beside it. Empty where there is neither.
+std::string TextOf(const Choice* choice, const LeftOut& left_out);
+// Of such a text, or any.
+LeftOut LeftOutIn(const std::string& text);
 
 // Weighs candidates of one clip against each other, one after the other.
 class Chooser {

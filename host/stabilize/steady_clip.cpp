@@ -41,10 +41,10 @@ SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium,
 
 SteadyClip::SteadyClip(const std::string& plugin, const ClipMedium& medium, const Project& project,
                        std::size_t shot)
-    : worked_(plugin, medium, project, shot),
-      choice_(Choice::Parse(project.shots[shot].choice)),
-      held_(choice_ ? choice_->still : Still::all) {
-  if (held_ != Still::all) worked_.TakeDeletedAsGroup();
+    : worked_(plugin, medium, project, shot), choice_(Choice::Parse(project.shots[shot].choice)) {
+  LeftOut left_out = LeftOutIn(project.shots[shot].choice);
+  held_ = left_out.still;
+  if (held_ != Still::all) worked_.TakeDeleted(std::move(left_out.deleted));
 }
 
 void SteadyClip::SetControls(const ParamValues& values) {
@@ -406,7 +406,9 @@ double SteadyClip::Zoom(const SolvedClip& solved) const {
 
 SavedShot SteadyClip::Saved() {
   SavedShot shot = worked_.Saved();
-  if (choice_) shot.choice = choice_->Json().dump();
+  // Known by now, where a group is left out.
+  shot.choice =
+      TextOf(choice(), {held_, held_ == Still::all ? std::set<TrackPoint>() : DeletedTracks()});
   has_new_choice_ = false;
   return shot;
 }

@@ -102,8 +102,7 @@ class SteadyClip {
   // Effect::DeleteTracks takes them. What is solved without them is there after the next Work, and
   // a choice that was made before is undone. Throws SolveFailure.
   void DeleteTracks(const std::set<TrackPoint>& points);
-  // The same as they are; of saved work those that it holds, unless tracks of a group are left out
-  // of it, which can't be told apart from them. An analysis forgets them.
+  // The same as they are; of saved work those that it holds. An analysis forgets them.
   const std::set<TrackPoint>& DeletedTracks() { return worked_.DeletedTracks(); }
   // Null where nothing was to choose.
   const Choice* choice() const { return choice_ ? &*choice_ : nullptr; }

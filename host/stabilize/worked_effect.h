@@ -6,6 +6,7 @@
 #include <memory>
 #include <set>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "host/effects/host.h"
@@ -77,8 +78,11 @@ class WorkedEffect {
   // See SteadyClip::DeleteTracks and DeletedTracks.
   void DeleteTracks(const std::set<TrackPoint>& points);
   const std::set<TrackPoint>& DeletedTracks();
-  // What saved work leaves out is of a group: it can't be told what of it a person deleted.
-  void TakeDeletedAsGroup() { knows_deleted_ = true; }
+  // Of what saved work leaves out a person deleted these, and the rest is a group's; else all.
+  void TakeDeleted(std::set<TrackPoint> deleted) {
+    deleted_ = std::move(deleted);
+    knows_deleted_ = true;
+  }
 
   // What the effect would save, and what of it is solved. Throws SolveFailure.
   SolvedClip Solved(SavedEffect* saved);
@@ -130,7 +134,7 @@ class WorkedEffect {
   Session session_;
   Effect* effect_ = nullptr;          // the session's
   std::set<TrackPoint> deleted_;      // by a person
-  bool knows_deleted_ = true;         // else saved work may hold some
+  bool knows_deleted_ = true;         // else all that saved work leaves out
   std::vector<TrackPoint> left_out_;  // of a group
   bool analysed_ = false;             // anew, and what is solved of it is still to begin
   bool is_worked_ = false;

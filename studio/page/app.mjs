@@ -1,9 +1,9 @@
 // The page as a whole: what is selected, the play head, keys.
-import {html, render, useCallback, useEffect, useRef, useState} from './lib/htm-preact.mjs';
+import {html, render, useCallback, useEffect, useMemo, useRef, useState} from './lib/htm-preact.mjs';
 import {Chart} from './chart.mjs';
 import {Chooser} from './chooser.mjs';
 import {ClipList} from './clip_list.mjs';
-import {ask, frameAddress, leftText, timeText, useStudio} from './link.mjs';
+import {ask, folderOf, frameAddress, leftText, stemOf, timeText, useStudio} from './link.mjs';
 import {Panel} from './panel.mjs';
 import {Player} from './player.mjs';
 import {RenderDialog, RenderList} from './render.mjs';
@@ -32,7 +32,7 @@ function useTheme() {
 }
 
 function Strip({clip, seek}) {
-  if (!clip.picture || !clip.info) return html`<div class="strip"></div>`;
+  if (!clip.picture || !clip.info) return null;
   const count = 12, last = clip.info.frames - 1;
   return html`<div class="strip" aria-hidden="true">${Array.from({length: count}, (_, i) => {
     const frame = Math.round(last * i / (count - 1));
@@ -44,6 +44,7 @@ function Transport({clip, frame, transport, update, mode, setMode}) {
   const info = clip.info;
   const last = info ? info.frames - 1 : 0;
   const range = transport.range;
+  const strip = useMemo(() => html`<${Strip} clip=${clip} seek=${(to) => update({seek: to})} />`, [clip]);
   return html`
     <div class="transport">
       <div class="modes" role="radiogroup">
@@ -51,33 +52,32 @@ function Transport({clip, frame, transport, update, mode, setMode}) {
             onClick=${() => setMode(one)}>${T.modes[one]}</button>`)}
       </div>
       <div class="scrub">
-        <${Strip} clip=${clip} seek=${(to) => update({seek: to})} />
+        ${strip}
         ${range && html`<div class="range" style=${{left: `${range[0] / Math.max(last, 1) * 100}%`, right: `${100 - range[1] / Math.max(last, 1) * 100}%`}}></div>`}
         <input type="range" class="head" min="0" max=${last} step="1" value=${frame} disabled=${!info} aria-label=${T.position}
                aria-valuetext=${info ? timeText(frame / info.rate) : ''} onInput=${(event) => update({seek: Number(event.target.value)})} />
       </div>
       <div class="keys">
-        <button class="round" aria-label=${T.stepBack} title=${T.stepBack} onClick=${() => update({step: -1})}>${ICONS.back}</button>
-        <button class="round primary" aria-label=${transport.speed ? T.pause : T.play} title=${T.keys} onClick=${() => update({toggle: true})}>${transport.speed ? ICONS.pause : ICONS.play}</button>
-        <button class="round" aria-label=${T.stepOn} title=${T.stepOn} onClick=${() => update({step: 1})}>${ICONS.on}</button>
+        <button class="round" disabled=${!info} aria-label=${T.stepBack} title=${T.stepBack} onClick=${() => update({step: -1})}>${ICONS.back}</button>
+        <button class="round primary" disabled=${!info} aria-label=${transport.speed ? T.pause : T.play} title=${T.keys} onClick=${() => update({toggle: true})}>${transport.speed ? ICONS.pause : ICONS.play}</button>
+        <button class="round" disabled=${!info} aria-label=${T.stepOn} title=${T.stepOn} onClick=${() => update({step: 1})}>${ICONS.on}</button>
         <output>${info ? timeText(frame / info.rate) : '0:00.00'} <i>/ ${info ? timeText(info.frames / info.rate) : '0:00.00'} · ${frame}</i></output>
         <span class="gap"></span>
         ${range && html`<button class="quiet" onClick=${() => update({range: null})}>${T.clearRange}</button>`}
-        <button class="quiet" title="I" onClick=${() => update({mark: 'in'})}>${T.inPoint}</button>
-        <button class="quiet" title="O" onClick=${() => update({mark: 'out'})}>${T.outPoint}</button>
+        <button class="quiet" disabled=${!info} title="I" onClick=${() => update({mark: 'in'})}>${T.inPoint}</button>
+        <button class="quiet" disabled=${!info} title="O" onClick=${() => update({mark: 'out'})}>${T.outPoint}</button>
         <label class="quiet"><input type="checkbox" checked=${transport.loop} onChange=${(event) => update({loop: event.target.checked})} /> ${T.loop}</label>
       </div>
     </div>`;
 }
 
-function Progress({clip}) {
-  const shown = clip.progress;
+function Progress({shown, cancel}) {
   const share = shown?.share;
   const stage = shown ? T.stages[shown.stage] || shown.stage : T.working;
   return html`
     <div class="progress">
       <div><b>${stage}</b> <span>${share !== undefined ? `${Math.round(share * 100)} %` : ''}${shown?.left ? ` · ${T.left(leftText(shown.left))}` : ''}</span>
-        <button onClick=${() => ask({op: 'cancel', clip: clip.id})}>${T.cancel}</button></div>
+        <button onClick=${cancel}>${T.cancel}</button></div>
       <div class=${`bar ${share === undefined ? 'unknown' : ''}`} role="progressbar" aria-label=${stage} aria-valuemin="0" aria-valuemax="100" aria-valuenow=${Math.round((share || 0) * 100)}>
         <span style=${{width: `${(share ?? 0.3) * 100}%`}}></span></div>
       ${shown?.says ? html`<p class="hint">${shown.says}</p>` : ''}
@@ -89,7 +89,7 @@ function Summary({clip}) {
   const outcome = clip.outcome;
   return html`
     <section class="summary">
-      ${clip.state === 'working' || clip.state === 'opening' ? html`<${Progress} clip=${clip} />`
+      ${clip.state === 'working' || clip.state === 'opening' ? html`<${Progress} shown=${clip.progress} cancel=${() => ask({op: 'cancel', clip: clip.id})} />`
         : clip.state !== 'ready' ? html`<button class="primary wide" onClick=${() => ask({op: clip.state === 'failed' || clip.state === 'closed' ? 'open' : 'analyze', clip: clip.id})}>
             ${clip.state === 'failed' || clip.state === 'closed' ? T.again : T.analyze}</button>` : ''}
       ${clip.error && html`<p class="error" role="alert">${clip.error}</p>`}
@@ -112,12 +112,15 @@ function Summary({clip}) {
     </section>`;
 }
 
-function Empty({open}) {
+// sample: how the drawing of the sample clip stands.
+function Empty({sample, open, trySample}) {
+  const draws = sample?.share !== undefined;
   return html`
     <main class="empty"><h1>${T.title}</h1>
       <ol>${T.welcome.map((line) => html`<li>${line}</li>`)}</ol>
-      <button class="primary" onClick=${open}>${T.open}</button>
-      <p class="hint">${T.noSample}</p></main>`;
+      ${draws ? html`<${Progress} shown=${{stage: 'drawing', share: sample.share}} cancel=${() => ask({op: 'end sample'})} />`
+        : html`<div class="starts"><button class="primary" onClick=${open}>${T.open}</button><button onClick=${trySample}>${T.trySample}</button></div>`}
+      ${sample?.error && html`<p class="error" role="alert">${sample.error}</p>`}</main>`;
 }
 
 function App() {
@@ -229,6 +232,11 @@ function App() {
     select(answer.clip);
     return '';
   };
+  const trySample = async () => {
+    const answer = await ask({op: 'sample'});
+    if (answer.error) setNote(answer.error);
+    else if (answer.clip) select(answer.clip);
+  };
   const save = async (path) => {
     let answer = await ask({op: 'save', clip: clip.id, path});
     if (answer.exists && confirm(T.replace)) answer = await ask({op: 'save', clip: clip.id, path, overwrite: true});
@@ -238,7 +246,16 @@ function App() {
     return '';
   };
   const running = studio.renders.filter((job) => ['waiting', 'saving', 'running'].includes(job.state));
-  const folder = clip?.path.replace(/\/[^/]*$/, '');
+  // What a frame that goes by doesn't change.
+  const list = useMemo(() => html`<${ClipList} studio=${studio} selected=${clip?.id} select=${select} open=${() => setDialog('open')} />`,
+                       [studio.heard, clip?.id]);
+  const side = useMemo(() => clip && html`
+    <aside class="side" aria-label=${T.controls}>
+      <${Summary} clip=${clip} />
+      <${Panel} key=${clip.id} clip=${clip} />
+    </aside>`, [clip]);
+  const folder = clip && folderOf(clip, studio.roots);
+  const isEmpty = studio.loaded && !studio.order.length;
   return html`
     <div class="frame" onDragOver=${(event) => event.preventDefault()} onDrop=${onDrop} data-tab=${tab}>
       <header class="top">
@@ -249,15 +266,16 @@ function App() {
           <button class="quiet" disabled=${!clip.can_redo} onClick=${() => ask({op: 'redo', clip: clip.id})} aria-label=${T.redo} title=${T.redo}>↷</button>
           <button disabled=${clip.state !== 'ready'} onClick=${() => setDialog('save')}>${T.save}</button>
           <button class="primary" disabled=${clip.state !== 'ready'} onClick=${() => setDialog('render')}>${T.render}</button>`}
-        <button class="quiet" onClick=${() => setDialog('renders')}>${T.renders}${running.length ? ` (${running.length})` : ''}</button>
+        ${(!isEmpty || studio.renders.length > 0) && html`
+          <button class="quiet" onClick=${() => setDialog('renders')}>${T.renders}${running.length ? ` (${running.length})` : ''}</button>`}
         <button class="quiet" aria-label=${T.theme} title=${T.theme} onClick=${turnTheme}>${theme === 'dark' ? '☀' : '☾'}</button>
       </header>
       ${!studio.connected && html`<p class="banner" role="alert">${T.lost}</p>`}
       ${studio.trouble && html`<p class="banner" role="alert">${studio.trouble}</p>`}
       ${note && html`<p class="banner note" role="status">${note} <button class="quiet" aria-label=${T.close} onClick=${() => setNote('')}>✕</button></p>`}
-      ${studio.loaded && !studio.order.length ? html`<${Empty} open=${() => setDialog('open')} />` : html`
+      ${isEmpty ? html`<${Empty} sample=${studio.sample} open=${() => setDialog('open')} trySample=${trySample} />` : html`
         <div class="body">
-          <${ClipList} studio=${studio} selected=${clip?.id} select=${select} open=${() => setDialog('open')} />
+          ${list}
           ${clip && html`
             <main class="centre">
               <${Player} key=${clip.id} clip=${clip} frame=${frame} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} />
@@ -267,14 +285,11 @@ function App() {
             <nav class="switch" role="tablist" aria-label=${T.narrowTabs}>
               ${[['controls', T.controls], ['motion', T.motion], ['clips', T.clips]].map(([one, text]) => html`<button role="tab" aria-selected=${tab === one} onClick=${() => setTab(one)}>${text}</button>`)}
             </nav>
-            <aside class="side" aria-label=${T.controls}>
-              <${Summary} clip=${clip} />
-              <${Panel} key=${clip.id} clip=${clip} />
-            </aside>`}
+            ${side}`}
         </div>`}
       ${dialog === 'open' && html`<${Chooser} title=${T.chooserTitle} roots=${studio.roots} start=${folder} action=${T.openIt} take=${openPath} onClose=${() => setDialog('')} />`}
-      ${dialog === 'save' && clip && html`<${Chooser} title=${T.chooserSave} roots=${studio.roots} start=${folder} name=${clip.name.replace(/\.[^.]*$/, '') + '.calm'} action=${T.saveIt} take=${save} onClose=${() => setDialog('')} />`}
-      ${dialog === 'render' && clip && html`<${RenderDialog} clip=${clip} range=${transport.range} onClose=${() => setDialog('')} />`}
+      ${dialog === 'save' && clip && html`<${Chooser} title=${T.chooserSave} roots=${studio.roots} start=${folder} name=${`${stemOf(clip)}.calm`} action=${T.saveIt} take=${save} onClose=${() => setDialog('')} />`}
+      ${dialog === 'render' && clip && html`<${RenderDialog} clip=${clip} folder=${folder} range=${transport.range} onClose=${() => setDialog('')} />`}
       ${dialog === 'renders' && html`<${RenderList} renders=${studio.renders} onClose=${() => setDialog('')} />`}
     </div>`;
 }

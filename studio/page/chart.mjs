@@ -1,6 +1,6 @@
 // The camera's path before and after, and what the window does, over time.
 import uPlot from './lib/uPlot.mjs';
-import {html, useEffect, useMemo, useRef, useState} from './lib/htm-preact.mjs';
+import {html, useEffect, useLayoutEffect, useMemo, useRef, useState} from './lib/htm-preact.mjs';
 import {useDocument} from './link.mjs';
 import {T} from './texts.mjs';
 
@@ -32,7 +32,7 @@ function colour(name) {
 
 export function Chart({clip, frame, seek, theme}) {
   const [kind, setKind] = useState('x');
-  const box = useRef(), chart = useRef(), live = useRef({});
+  const box = useRef(), live = useRef({});
   const document_ = useDocument('/api/curves', clip.id, clip.curves);
   const shots = document_?.shots?.filter((shot) => shot.curves);
   Object.assign(live.current, {frame, clip, seek});
@@ -57,6 +57,16 @@ export function Chart({clip, frame, seek, theme}) {
       plot.ctx.stroke();
       plot.ctx.restore();
     };
+    // Moved by itself: while a clip plays nothing else of the chart is drawn anew.
+    const head = document.createElement('i');
+    head.className = 'now';
+    const place = (of) => {
+      const {clip: shown, frame: at} = live.current;
+      const x = shown.info ? of.valToPos(at / shown.info.rate, 'x') : -1;
+      head.hidden = !(x >= 0 && x <= of.bbox.width / devicePixelRatio);
+      head.style.transform = `translateX(${x}px)`;
+    };
+    live.current.place = () => place(plot);
     const options = {
       width: Math.max(200, box.current.clientWidth), height: 150,
       legend: {show: false},
@@ -68,17 +78,18 @@ export function Chart({clip, frame, seek, theme}) {
         : [{}, {stroke: colour('--accent'), width: 2, points: {show: false}, label: kind === 'window' ? T.seriesZoom : T.seriesBlack, ...(kind === 'black' ? {fill: colour('--accent-soft')} : {})}],
       hooks: {
         draw: [(plot) => {
-          const {clip: of, frame: at} = live.current;
+          const {clip: of} = live.current;
           if (!of.info) return;
           for (const shot of (of.shots || []).slice(1)) mark(plot, shot.first / of.info.rate, colour('--dim'), [2, 4]);
           const worst = of.outcome?.worst_shake > 0 ? of.outcome.worst_at : undefined;
           if (worst !== undefined) mark(plot, worst, colour('--warn'), [6, 4]);
-          mark(plot, at / of.info.rate, colour('--text'), []);
+          place(plot);
         }],
       },
     };
     const plot = new uPlot(options, data, box.current);
-    chart.current = plot;
+    plot.over.append(head);
+    place(plot);
     plot.over.addEventListener('click', (event) => {
       if (plot.select.width > 2) return;
       const {clip: of} = live.current;
@@ -89,10 +100,10 @@ export function Chart({clip, frame, seek, theme}) {
       if (width !== plot.width) plot.setSize({width, height: 150});
     });
     watch.observe(box.current);
-    return () => { watch.disconnect(); plot.destroy(); chart.current = null; };
+    return () => { watch.disconnect(); plot.destroy(); live.current.place = null; };
   }, [data, theme]);
 
-  useEffect(() => { chart.current?.redraw(false, false); }, [frame]);
+  useLayoutEffect(() => live.current.place?.(), [frame]);
 
   return html`
     <section class="chart" aria-label=${T.motion}>

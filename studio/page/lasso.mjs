@@ -48,6 +48,12 @@ export function Lasso({clip, frame, playing}) {
     const answer = await lasso({any_frame: any, deletes: true});
     if (answer.error) setError(answer.error);
     else clear();
+    // The button that was pressed is gone: by the keyboard it goes on from here.
+    box.current?.focus();
+  };
+  const restore = async () => {
+    await ask({op: 'restore tracks', clip: clip.id});
+    box.current?.focus();
   };
   const onKey = (event) => {
     const by = {ArrowLeft: [-STEP, 0], ArrowRight: [STEP, 0], ArrowUp: [0, -STEP], ArrowDown: [0, STEP]}[event.key];
@@ -84,7 +90,7 @@ export function Lasso({clip, frame, playing}) {
         <button title=${T.deleteAllMeans} onClick=${() => remove(true)}>${T.deleteAll}</button>`
         : html`<span>${T.lasso}</span>`}
       ${clip.deleted > 0 && html`<span>${T.deletedTracks(clip.deleted)}</span>
-        <button onClick=${() => ask({op: 'restore tracks', clip: clip.id})}>${T.restoreTracks}</button>`}
+        <button onClick=${restore}>${T.restoreTracks}</button>`}
       ${error && html`<b role="alert">${error}</b>`}
     </div>`;
 }

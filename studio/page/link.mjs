@@ -1,7 +1,7 @@
 // What the page hears from the studio, and what it asks for.
 import {useEffect, useState} from './lib/htm-preact.mjs';
 
-const state = {clips: {}, order: [], renders: [], roots: [], trouble: '', connected: true, loaded: false};
+const state = {clips: {}, order: [], renders: [], roots: [], sample: null, trouble: '', heard: 0, connected: true, loaded: false};
 const listeners = new Set();
 
 function tell() {
@@ -19,10 +19,11 @@ function connect() {
   source.onmessage = (event) => {
     const data = JSON.parse(event.data);
     Object.assign(state.clips, data.clips);
-    for (const key of ['order', 'renders', 'roots', 'trouble']) {
+    for (const key of ['order', 'renders', 'roots', 'sample', 'trouble']) {
       if (key in data) state[key] = data[key];
     }
     state.loaded = true;
+    ++state.heard;
     state.connected = true;
     tell();
   };
@@ -39,6 +40,7 @@ export function useStudio() {
   useEffect(() => {
     const listener = () => count((n) => n + 1);
     listeners.add(listener);
+    listener();  // of what was told before
     return () => listeners.delete(listener);
   }, []);
   return state;
@@ -66,9 +68,24 @@ export async function get(path, parameters) {
   }
 }
 
+// Where what is made of a clip is offered to be written: beside it, unless it lies where no folder is open.
+export function folderOf(clip, roots) {
+  const folder = clip.path.replace(/\/[^/]*$/, '') || '/';
+  const isOpen = roots.some((root) => folder === root || folder.startsWith(root === '/' ? root : `${root}/`));
+  return isOpen ? folder : roots[0];
+}
+
+export function stemOf(clip) {
+  return clip.name.replace(/\.[^.]*$/, '');
+}
+
+// Of a clip's pictures, but for their width and their frame.
+export function framesAddress(clip, side) {
+  return `/api/frame?clip=${clip.id}&side=${side}&v=${side === 'before' ? 0 : clip.picture || 0}`;
+}
+
 export function frameAddress(clip, side, frame, width) {
-  return '/api/frame?' + new URLSearchParams(
-    {clip: clip.id, side, frame, width, v: side === 'before' ? 0 : clip.picture || 0});
+  return `${framesAddress(clip, side)}&width=${width}&frame=${frame}`;
 }
 
 // A document of a clip that has a number of its own, such as its panel.

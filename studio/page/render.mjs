@@ -1,21 +1,26 @@
 // Rendering to a file: the dialog, and the list of what is rendered.
 import {html, useState} from './lib/htm-preact.mjs';
 import {Dialog} from './chooser.mjs';
-import {ask, leftText, timeText} from './link.mjs';
+import {ask, leftText, stemOf, timeText} from './link.mjs';
 import {T} from './texts.mjs';
 
-export function RenderDialog({clip, range, onClose}) {
-  const dot = clip.path.lastIndexOf('.');
-  const [path, setPath] = useState(`${dot > 0 ? clip.path.slice(0, dot) : clip.path}-calm.mp4`);
+export function RenderDialog({clip, folder, range, onClose}) {
+  const [path, setPath] = useState(`${folder === '/' ? '' : folder}/${stemOf(clip)}-calm.mp4`);
   const [crf, setCrf] = useState('18');
   const [codec, setCodec] = useState('');
+  const [preset, setPreset] = useState('');
+  const [options, setOptions] = useState('');
+  const [busy, setBusy] = useState(false);
   const [part, setPart] = useState(!!range);
   const [error, setError] = useState('');
   const [exists, setExists] = useState(false);
   const start = async (overwrite) => {
-    const request = {op: 'render', clip: clip.id, path, crf: Number(crf), codec, overwrite};
+    const request = {op: 'render', clip: clip.id, path, crf: Number(crf), codec, preset, options: options.split(/\s+/).filter(Boolean), overwrite};
     if (part && range) Object.assign(request, {from: `${range[0]}f`, to: `${range[1] + 1}f`});
+    setError('');
+    setBusy(true);
     const answer = await ask(request);
+    setBusy(false);
     if (!answer.error) return onClose();
     setExists(!!answer.exists);
     return setError(answer.exists ? T.replace : answer.error);
@@ -28,12 +33,15 @@ export function RenderDialog({clip, range, onClose}) {
           ${Object.entries(T.qualities).map(([value, text]) => html`<option value=${value} selected=${value === crf}>${text}</option>`)}</select></label>
         <label>${T.codec}<select value=${codec} onChange=${(event) => setCodec(event.target.value)}>
           ${Object.entries(T.codecs).map(([value, text]) => html`<option value=${value} selected=${value === codec}>${text}</option>`)}</select></label>
+        <label>${T.preset}<select value=${preset} onChange=${(event) => setPreset(event.target.value)}>
+          ${Object.entries(T.presets).map(([value, text]) => html`<option value=${value} selected=${value === preset}>${text}</option>`)}</select></label>
+        <label title=${T.optionsMean}>${T.options}<input value=${options} placeholder="tune=grain g=50" onInput=${(event) => setOptions(event.target.value)} spellcheck=${false} /></label>
         ${range && html`<label>${T.range}<select value=${part ? 'part' : 'all'} onChange=${(event) => setPart(event.target.value === 'part')}>
           <option value="all" selected=${!part}>${T.rangeAll}</option>
           <option value="part" selected=${part}>${T.rangePart(timeText(range[0] / clip.info.rate), timeText((range[1] + 1) / clip.info.rate))}</option></select></label>`}
         ${error && html`<p class="error" role="alert">${error}</p>`}
-        <footer>${exists && html`<button type="button" onClick=${() => start(true)}>${T.replaceIt}</button>`}
-          <button class="primary">${T.startRender}</button></footer>
+        <footer>${exists && html`<button type="button" disabled=${busy} onClick=${() => start(true)}>${T.replaceIt}</button>`}
+          <button class="primary" disabled=${busy}>${T.startRender}</button></footer>
       </form>
     <//>`;
 }

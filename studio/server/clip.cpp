@@ -68,7 +68,7 @@ void Clip::Open() {
   } catch (const std::system_error& error) {
     state_["state"] = "failed";
     state_["error"] = std::string("the clip's worker can't be started: ") + error.what();
-    surroundings_.changed(id_);
+    surroundings_.changed(id_, ClipSurroundings::When::now);
     return;
   }
   workers_ += std::uint64_t{1} << 20;
@@ -82,7 +82,7 @@ void Clip::Open() {
                          {"version", version_}};
   if (has_settings_) head["settings"] = JsonOf(settings_);
   worker_->Send({std::move(head), {}});
-  surroundings_.changed(id_);
+  surroundings_.changed(id_, ClipSurroundings::When::now);
 }
 
 void Clip::CloseWorker() {
@@ -113,7 +113,7 @@ void Clip::Take(Message message) {
         state_[key] = std::move(value);
       }
     }
-    surroundings_.changed(id_);
+    surroundings_.changed(id_, ClipSurroundings::When::now);
     return;
   }
   const auto waiting = waiting_.find(message.head.value("id", std::uint64_t{0}));
@@ -132,7 +132,7 @@ void Clip::End(int code, const std::string& said) {
     reply({{{"error", state_["error"]}}, {}});
   }
   waiting_.clear();
-  surroundings_.changed(id_);
+  surroundings_.changed(id_, ClipSurroundings::When::now);
 }
 
 const nlohmann::json* Clip::ChoiceShown() const {
@@ -258,7 +258,7 @@ void Clip::Give(Settings settings) {
   has_settings_ = true;
   ++version_;
   Tell({{"op", "set"}, {"settings", JsonOf(settings_)}, {"version", version_}});
-  surroundings_.changed(id_);
+  surroundings_.changed(id_, ClipSurroundings::When::soon);
 }
 
 std::uint64_t Clip::Ask(nlohmann::json head, Reply reply) {

@@ -22,7 +22,9 @@ struct ClipSurroundings {
   EndingThreads& ending;
   std::vector<std::string> roots;         // see Roots
   std::vector<std::string> worker_words;  // see WorkerProcess
-  std::function<void(const std::string& id)> changed;
+  // soon: within a moment is early enough, since more is likely to come of it by then.
+  enum class When { now, soon };
+  std::function<void(const std::string& id, When when)> changed;
 };
 
 // A clip that a person has open: its settings with their history, which outlast its worker, and

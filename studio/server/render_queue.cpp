@@ -1,15 +1,11 @@
 #include "studio/server/render_queue.h"
 
 #include <algorithm>
-#include <boost/asio/post.hpp>
-#include <chrono>
-#include <exception>
 #include <filesystem>
 #include <system_error>
 #include <utility>
 
-#include "host/base/json_depth.h"
-#include "host/batch/child.h"
+#include "studio/server/program_run.h"
 
 namespace calmframe::studio {
 namespace {
@@ -47,8 +43,7 @@ struct RenderQueue::Job {
   std::string error;
   std::vector<std::string> notes;
   std::string project;
-  std::shared_ptr<std::atomic<bool>> stops = std::make_shared<std::atomic<bool>>(false);
-  std::thread thread;
+  std::unique_ptr<ProgramRun> run;
 
   bool has_ended() const { return state == "done" || state == "failed" || state == "cancelled"; }
 };
@@ -62,9 +57,8 @@ RenderQueue::RenderQueue(boost::asio::io_context& context, std::string program, 
       changed_(std::move(changed)) {}
 
 RenderQueue::~RenderQueue() {
-  for (const std::unique_ptr<Job>& job : jobs_) *job->stops = true;
   for (const std::unique_ptr<Job>& job : jobs_) {
-    if (job->thread.joinable()) job->thread.join();
+    job->run.reset();
     std::error_code ignored;
     if (!job->project.empty()) std::filesystem::remove(job->project, ignored);
   }
@@ -83,9 +77,8 @@ RenderQueue::Job* RenderQueue::Find(std::uint64_t number) const {
 
 void RenderQueue::Add(RenderOrder order) {
   if (jobs_.size() >= kMostJobs) {
-    const auto ended = std::find_if(jobs_.begin(), jobs_.end(), [](const auto& job) {
-      return job->has_ended() && !job->thread.joinable();
-    });
+    const auto ended =
+        std::find_if(jobs_.begin(), jobs_.end(), [](const auto& job) { return job->has_ended(); });
     if (ended == jobs_.end()) throw std::invalid_argument("too many renders are waiting");
     jobs_.erase(ended);
   }
@@ -101,7 +94,7 @@ void RenderQueue::Remove(std::uint64_t number) {
   Job* const job = Find(number);
   if (!job) return;
   if (job->state == "running") {
-    *job->stops = true;
+    job->run->Stop();
   } else if (job->state == "waiting" || job->state == "saving") {
     job->state = "cancelled";
   } else {
@@ -147,93 +140,63 @@ void RenderQueue::Next() {
 
 void RenderQueue::Run(Job& job, const Settings& settings) {
   job.state = "running";
-  std::vector<std::string> words = {program_,
-                                    "render",
-                                    "--project",
-                                    job.project,
-                                    "--json",
-                                    "--crf",
-                                    std::to_string(job.order.crf)};
-  if (!job.order.codec.empty()) words.insert(words.end(), {"--codec", job.order.codec});
-  if (job.order.overwrite) words.push_back("--overwrite");
-  if (!job.order.from.empty()) words.insert(words.end(), {"--from", job.order.from});
-  if (!job.order.to.empty()) words.insert(words.end(), {"--to", job.order.to});
+  const media::EncodeSettings& encode = job.order.encode;
+  std::vector<std::string> words = {
+      program_, "render", "--project", job.project, "--json", "--crf", std::to_string(encode.crf)};
+  // One word each: what is set may begin as a flag does.
+  const auto add = [&words](const std::string& flag, const std::string& value) {
+    if (!value.empty()) words.push_back(flag + "=" + value);
+  };
+  add("--codec", encode.codec);
+  add("--preset", encode.preset);
+  for (const std::string& option : encode.options) add("--encoder-option", option);
+  add("--from", job.order.from);
+  add("--to", job.order.to);
+  if (encode.overwrite) words.push_back("--overwrite");
   AddWindowFlags(settings.window, words);
   words.push_back(job.order.output);
-  job.thread = std::thread([this, words, number = job.number, stops = job.stops] {
-    int code = 127;
-    try {
-      batch::Child child(words);
-      using Clock = std::chrono::steady_clock;
-      constexpr std::chrono::seconds kUntilKilled(20);
-      std::string line;
-      std::optional<Clock::time_point> stopped;
-      while (true) {
-        const batch::Child::Said said = child.Next(line, 100);
-        if (*stops) {
-          child.AskToEnd();
-          if (!stopped) stopped = Clock::now();
-          if (Clock::now() - *stopped > kUntilKilled) break;
-        }
-        if (said == batch::Child::Said::end) break;
-        if (said != batch::Child::Said::line) continue;
-        boost::asio::post(context_, [this, number, line] { Heard(number, line); });
-      }
-      child.Kill();  // see WorkerProcess::Start
-      code = child.Wait();
-    } catch (const std::exception& error) {
-      const nlohmann::json told = {{"error", error.what()}};
-      boost::asio::post(context_, [this, number, line = told.dump()] { Heard(number, line); });
-    }
-    boost::asio::post(context_, [this, number, code] { Ended(number, code); });
-  });
+  const std::uint64_t number = job.number;
+  try {
+    job.run = std::make_unique<ProgramRun>(
+        context_, std::move(words),
+        ProgramRun::Events{[this, number](const nlohmann::json& told) { Heard(number, told); },
+                           [this, number](const std::string& error) { Ended(number, error); }});
+  } catch (const std::system_error& error) {  // no thread is left
+    Ended(number, error.what());
+  }
 }
 
-void RenderQueue::Heard(std::uint64_t number, const std::string& line) {
+void RenderQueue::Heard(std::uint64_t number, const nlohmann::json& told) {
   Job* const job = Find(number);
   if (!job) return;
-  const nlohmann::json told =
-      NestsTooDeep(line) ? nullptr : nlohmann::json::parse(line, nullptr, false);
-  if (!told.is_object()) {
-    job->error = line;
-    return;
+  if (told.contains("warning") && job->notes.size() < kMostNotes) {
+    job->notes.push_back(told["warning"].get<std::string>());
   }
-  try {
-    if (told.contains("error")) job->error = told["error"].get<std::string>();
-    if (told.contains("warning") && job->notes.size() < kMostNotes) {
-      job->notes.push_back(told["warning"].get<std::string>());
-    }
-    if (told.value("stage", "") == "rendering") {
-      job->share = std::clamp(told.value("share", 0.0), 0.0, 1.0);
-      const double elapsed = told.value("elapsed", 0.0);
-      job->left = nullptr;
-      if (job->share > 0.02) job->left = elapsed * (1 - job->share) / job->share;
-    }
-  } catch (const nlohmann::json::exception&) {  // of a program that a clip has taken over
+  if (told.value("stage", "") == "rendering") {
+    job->share = std::clamp(told.value("share", 0.0), 0.0, 1.0);
+    const double elapsed = told.value("elapsed", 0.0);
+    job->left = nullptr;
+    if (job->share > 0.02) job->left = elapsed * (1 - job->share) / job->share;
   }
   changed_();
 }
 
-void RenderQueue::Ended(std::uint64_t number, int code) {
+void RenderQueue::Ended(std::uint64_t number, const std::string& error) {
   Job* const job = Find(number);
   if (!job) return;
-  if (job->thread.joinable()) job->thread.join();
+  const bool stopped = job->run && job->run->is_stopped();
+  job->run.reset();
   std::error_code ignored;
   std::filesystem::remove(job->project, ignored);
   job->left = nullptr;
-  if (code == 0) {
+  if (error.empty()) {
     job->state = "done";
     job->share = 1;
-    job->error.clear();
-  } else if (*job->stops) {
+  } else if (stopped) {
     job->state = "cancelled";
-    job->error.clear();
   } else {
     job->state = "failed";
-    if (job->error.empty()) {
-      job->error = code > 128 ? "the render crashed (signal " + std::to_string(code - 128) + ")"
-                              : "the render ended with code " + std::to_string(code);
-    }
+    job->error = error;
   }
   Next();
   changed_();

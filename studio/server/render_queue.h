@@ -1,6 +1,5 @@
 #pragma once
 
-#include <atomic>
 #include <boost/asio/io_context.hpp>
 #include <cstdint>
 #include <functional>
@@ -8,9 +7,9 @@
 #include <nlohmann/json.hpp>
 #include <optional>
 #include <string>
-#include <thread>
 #include <vector>
 
+#include "host/media/clip.h"
 #include "studio/wire/settings.h"
 
 namespace calmframe::studio {
@@ -19,9 +18,7 @@ namespace calmframe::studio {
 struct RenderOrder {
   std::string clip, name;  // of the clip: its id, and its file
   std::string output;
-  int crf = 18;
-  std::string codec;  // empty: what the kind of file takes
-  bool overwrite = false;
+  media::EncodeSettings encode;
   std::string from, to;  // times as flags have them; empty: all
 };
 
@@ -55,8 +52,8 @@ class RenderQueue {
   struct Job;
   void Next();
   void Run(Job& job, const Settings& settings);
-  void Heard(std::uint64_t number, const std::string& line);
-  void Ended(std::uint64_t number, int code);
+  void Heard(std::uint64_t number, const nlohmann::json& told);
+  void Ended(std::uint64_t number, const std::string& error);
   Job* Find(std::uint64_t number) const;
   std::string ProjectOf(std::uint64_t number) const;
 

@@ -15,6 +15,7 @@
 
 #include "platform/tessel/guid.h"
 #include "studio/server/trust.h"
+#include "studio/wire/encoding.h"
 
 namespace calmframe::studio {
 namespace {
@@ -31,6 +32,14 @@ constexpr std::size_t kMostCorners = 1000;  // of a lasso: each is held against 
 constexpr std::int32_t kMostControl = std::numeric_limits<std::int32_t>::max();  // disk id
 constexpr std::size_t kMostWays = 1000;
 constexpr std::uint64_t kMostRenders = std::uint64_t{1} << 53;
+
+// The folders with the sample's, which is made.
+std::vector<std::string> ReadableFolders(const StudioSettings& settings) {
+  fs::create_directories(settings.SampleFolder());
+  std::vector<std::string> folders = settings.roots;
+  folders.push_back(settings.SampleFolder());
+  return folders;
+}
 
 bool IsProject(const std::string& path) {
   return fs::path(path).extension() == ".calm";
@@ -54,13 +63,15 @@ Whole WholeIn(const nlohmann::json& request, const char* name, Whole most) {
 Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
     : context_(context),
       roots_(settings.roots),
+      readable_(ReadableFolders(settings)),
       folder_(settings.folder),
       work_folder_(settings.WorkFolder()),
-      surroundings_{context,
-                    ending_,
-                    roots_.folders(),
-                    {settings.program},
-                    [this](const std::string& id) { Changed(id); }},
+      surroundings_{
+          context,
+          ending_,
+          readable_.folders(),
+          {settings.program},
+          [this](const std::string& id, ClipSurroundings::When when) { Changed(id, when); }},
       flush_(context),
       keep_(context) {
   surroundings_.worker_words.insert(surroundings_.worker_words.end(), settings.worker.begin(),
@@ -94,6 +105,15 @@ Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
         renders_changed_ = true;
         Flush();
       });
+  std::vector<std::string> sample = {settings.program};
+  sample.insert(sample.end(), settings.sample.begin(), settings.sample.end());
+  sample_ = std::make_unique<SampleClip>(
+      context, std::move(sample), readable_.folders().back() + "/sample.mp4",
+      [this] { Add(sample_->path()); },
+      [this] {
+        sample_changed_ = true;
+        Flush();
+      });
   Restore();
   if (secret_.empty() || kept_password_ != MarkOf(settings.password, secret_)) {
     secret_ = NewSecret();
@@ -106,6 +126,7 @@ Studio::~Studio() = default;
 
 void Studio::StopAll() {
   Keep();
+  sample_.reset();
   renders_.reset();
   clips_.clear();
 }
@@ -119,8 +140,8 @@ void Studio::Restore() {
     for (const nlohmann::json clip : kept->value("clips", nlohmann::ordered_json::array())) {
       try {
         const std::string id = clip.at("id").get<std::string>();
-        roots_.ExistingClip(clip.value("path", "").empty() ? clip.value("project", "")
-                                                           : clip.value("path", ""));
+        readable_.ExistingClip(clip.value("path", "").empty() ? clip.value("project", "")
+                                                              : clip.value("path", ""));
         clips_.push_back(std::make_unique<Clip>(surroundings_, clip, KeepPath(id)));
       } catch (const std::exception&) {  // damaged, or in a folder that is none of this studio's
       }
@@ -143,7 +164,7 @@ Clip& Studio::At(const nlohmann::json& request) const {
 }
 
 std::string Studio::Add(const std::string& path) {
-  const std::string place = roots_.ExistingClip(path);
+  const std::string place = readable_.ExistingClip(path);
   for (const std::unique_ptr<Clip>& clip : clips_) {
     if (clip->path() == place) return clip->id();
   }
@@ -194,6 +215,15 @@ nlohmann::json Studio::Act(const nlohmann::json& request, const Answer& later,
   const std::string op = request.at("op").get<std::string>();
   if (op == "add") return {{"clip", Add(request.at("path").get<std::string>())}};
   if (op == "find") return {{"clip", Add(roots_.Find(request.at("name").get<std::string>()))}};
+  if (op == "sample") {
+    if (sample_->is_there()) return {{"clip", Add(sample_->path())}};
+    sample_->Draw();
+    return nlohmann::json::object();
+  }
+  if (op == "end sample") {
+    sample_->Cancel();
+    return nlohmann::json::object();
+  }
   if (op == "end render") {
     renders_->Remove(WholeIn(request, "render", kMostRenders));
     return nlohmann::json::object();
@@ -260,28 +290,46 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
       later(said);
     });
   } else if (op == "render") {
-    RenderOrder order;
-    order.clip = clip.id();
-    order.name = fs::path(clip.path()).filename();
-    order.output = roots_.ToWrite(request.at("path").get<std::string>());
-    if (request.contains("crf")) order.crf = WholeIn(request, "crf", 63);
-    order.codec = request.value("codec", "");
-    order.overwrite = request.value("overwrite", false);
-    order.from = request.value("from", "");
-    order.to = request.value("to", "");
-    for (const std::string* word : {&order.codec, &order.from, &order.to}) {
-      if (word->find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789"
-                                  "_.:") != std::string::npos) {
-        throw std::invalid_argument(*word + ": is no codec or time");
-      }
-    }
-    if (fs::exists(order.output) && !order.overwrite) {
-      return {{"error", order.output + ": is there already"}, {"exists", true}};
-    }
-    renders_->Add(std::move(order));
+    return Render(clip, request, later, answers_later);
   } else {
     throw std::invalid_argument("there is no such operation");
   }
+  return nlohmann::json::object();
+}
+
+// Into the queue, once the clip's worker has seen that the output can be had like that.
+nlohmann::json Studio::Render(Clip& clip, const nlohmann::json& request, const Answer& later,
+                              bool* answers_later) {
+  RenderOrder order;
+  order.clip = clip.id();
+  order.name = fs::path(clip.path()).filename();
+  order.output = roots_.ToWrite(request.at("path").get<std::string>());
+  order.encode = EncodeSettingsOf(request);
+  order.from = request.value("from", "");
+  order.to = request.value("to", "");
+  for (const std::string* time : {&order.from, &order.to}) {
+    if (time->find_first_not_of("abcdefghijklmnopqrstuvwxyz0123456789_.:") != std::string::npos) {
+      throw std::invalid_argument(*time + ": is no time");
+    }
+  }
+  if (fs::exists(order.output) && !order.encode.overwrite) {
+    return {{"error", order.output + ": is there already"}, {"exists", true}};
+  }
+  *answers_later = true;
+  Open(clip);
+  clip.Ask({{"op", "try output"}, {"path", order.output}, {"encode", JsonOf(order.encode)}},
+           [this, order, later](const Message& answer) {
+             nlohmann::json said = nlohmann::json::object();
+             try {
+               if (const std::string error = answer.head.value("error", ""); !error.empty()) {
+                 throw std::runtime_error(error);
+               }
+               renders_->Add(order);
+             } catch (const std::exception& error) {
+               said["error"] = error.what();
+             }
+             later(said);
+           });
   return nlohmann::json::object();
 }
 
@@ -323,11 +371,9 @@ void Studio::Forget(const std::string& id, std::uint64_t number) {
 }
 
 std::uint64_t Studio::Listen(Listener listener) {
-  nlohmann::json all = {{"clips", nlohmann::json::object()},
-                        {"order", Order()},
-                        {"renders", renders_->State()},
-                        {"roots", roots_.folders()},
-                        {"trouble", trouble_}};
+  nlohmann::json all = {{"clips", nlohmann::json::object()}, {"order", Order()},
+                        {"renders", renders_->State()},      {"roots", roots_.folders()},
+                        {"sample", sample_->State()},        {"trouble", trouble_}};
   for (const std::unique_ptr<Clip>& clip : clips_) all["clips"][clip->id()] = clip->State();
   listener(std::make_shared<const std::string>(
       all.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace)));
@@ -341,18 +387,21 @@ nlohmann::json Studio::Order() const {
   return order;
 }
 
-void Studio::Changed(const std::string& id) {
+void Studio::Changed(const std::string& id, ClipSurroundings::When when) {
   changed_.insert(id);
   KeepSoon();
-  Flush();
+  Flush(when);
 }
 
 // Many changes at once are one event; one by itself waits for none.
-void Studio::Flush() {
-  if (flushes_) return;
-  flushes_ = true;
+void Studio::Flush(ClipSurroundings::When when) {
   constexpr std::chrono::milliseconds kBetween(30);
-  flush_.expires_at(std::max(std::chrono::steady_clock::now(), flushed_at_ + kBetween));
+  auto at = std::chrono::steady_clock::now();
+  if (when == ClipSurroundings::When::soon) at += kBetween;
+  at = std::max(at, flushed_at_ + kBetween);
+  if (flushes_ && flush_.expiry() <= at) return;
+  flushes_ = true;
+  flush_.expires_at(at);  // of a later one nothing is heard any more
   flush_.async_wait([this](const boost::system::error_code& error) {
     if (error) return;
     flushes_ = false;
@@ -363,9 +412,10 @@ void Studio::Flush() {
     }
     if (order_changed_) event["order"] = Order();
     if (renders_changed_) event["renders"] = renders_->State();
+    if (sample_changed_) event["sample"] = sample_->State();
     event["trouble"] = trouble_;
     changed_.clear();
-    order_changed_ = renders_changed_ = false;
+    order_changed_ = renders_changed_ = sample_changed_ = false;
     Send(event);
   });
 }

@@ -17,6 +17,7 @@
 #include "host/batch/files.h"
 #include "studio/server/clip.h"
 #include "studio/server/render_queue.h"
+#include "studio/server/sample_clip.h"
 #include "studio/wire/roots.h"
 
 namespace calmframe::studio {
@@ -27,8 +28,10 @@ struct StudioSettings {
   std::vector<std::string> roots;
   std::string folder;         // where clips, choices and work are kept; made where it isn't there
   std::string password = {};  // that lets in; with another one whoever was let in before is out
+  std::vector<std::string> sample = {};  // words that make the program draw the sample clip
   // The part of it that workers and renders need: the rest has the secret.
   std::string WorkFolder() const { return folder + "/work"; }
+  std::string SampleFolder() const { return WorkFolder() + "/sample"; }
 };
 
 // What a person works on: clips and renders, as every window of theirs sees them. On the context's
@@ -71,13 +74,15 @@ class Studio {
   nlohmann::json Act(const nlohmann::json& request, const Answer& later, bool* answers_later);
   nlohmann::json ActOnClip(const std::string& op, Clip& clip, const nlohmann::json& request,
                            const Answer& later, bool* answers_later);
+  nlohmann::json Render(Clip& clip, const nlohmann::json& request, const Answer& later,
+                        bool* answers_later);
   void AskForTracks(Clip& clip, const nlohmann::json& request, const Answer& later);
   Clip* Find(const std::string& id) const;
   Clip& At(const nlohmann::json& request) const;
   void Open(Clip& clip);
   void Restore();
-  void Changed(const std::string& clip);
-  void Flush();
+  void Changed(const std::string& clip, ClipSurroundings::When when = ClipSurroundings::When::now);
+  void Flush(ClipSurroundings::When when = ClipSurroundings::When::now);
   void Send(const nlohmann::json& event);
   nlohmann::json Order() const;
   // True where it is on the disk.
@@ -87,6 +92,7 @@ class Studio {
 
   boost::asio::io_context& context_;
   const Roots roots_;
+  const Roots readable_;  // these and the sample's folder, which pages don't browse
   const std::string folder_, work_folder_;
   std::unique_ptr<batch::FileLock> lock_;
   std::string secret_, kept_password_;  // the latter as a mark
@@ -95,10 +101,11 @@ class Studio {
   std::vector<std::unique_ptr<Clip>> clips_;
   std::list<std::string> used_;  // open clips, the last used first
   std::unique_ptr<RenderQueue> renders_;
+  std::unique_ptr<SampleClip> sample_;
   std::map<std::uint64_t, Listener> listeners_;
   std::uint64_t listeners_ever_ = 0;
   std::set<std::string> changed_;
-  bool renders_changed_ = false, order_changed_ = false;
+  bool renders_changed_ = false, order_changed_ = false, sample_changed_ = false;
   boost::asio::steady_timer flush_, keep_;
   bool flushes_ = false, keeps_ = false;
   std::chrono::steady_clock::time_point flushed_at_;

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <exception>
 #include <thread>
 #include <utility>
 
@@ -97,6 +98,21 @@ void ClipDesk::LookAt(std::int64_t frame) {
   const std::lock_guard lock(mutex_);
   looked_at_ = frame;
   changed_.notify_all();
+}
+
+std::string ClipDesk::OutputTrouble(const std::string& path, const media::EncodeSettings& encode) {
+  std::optional<media::ClipInfo> info;
+  {
+    const std::lock_guard lock(mutex_);
+    info = info_;
+  }
+  if (!info) return "";
+  try {
+    media::ClipWriter::Create(path, *info, info->width, info->height, encode);
+  } catch (const std::exception& failure) {
+    return failure.what();
+  }
+  return "";
 }
 
 std::optional<std::size_t> ClipDesk::ShotAt(std::int64_t frame) const {

@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <nlohmann/json.hpp>
@@ -13,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "host/media/clip.h"
 #include "host/stabilize/film.h"
 #include "studio/wire/settings.h"
 #include "studio/worker/frame_desk.h"
@@ -68,6 +70,9 @@ class ClipDesk {
   std::vector<LassoedTrack> TracksIn(const Lasso& lasso);
   // Somebody looks at that frame.
   void LookAt(std::int64_t frame);
+  // Why the clip can't be written to a file like that, one line; empty where it can, or isn't open
+  // yet. Nothing is left there.
+  std::string OutputTrouble(const std::string& path, const media::EncodeSettings& encode);
 
   void Run();
 
@@ -112,6 +117,7 @@ class ClipDesk {
   void ForgetDeleted();
   void KeepResult(host::SteadyClip& shot, std::uint64_t version, bool solved);
   void SaveNow(const SaveRequest& request);
+  void TellInfo();
   void TellPanel(host::SteadyClip& shot);
   void TellShots();
   void TellPicture();
@@ -142,6 +148,7 @@ class ClipDesk {
   std::chrono::steady_clock::time_point steady_at_;
   std::optional<std::int64_t> looked_at_;
   bool wants_tracks_ = false;
+  std::optional<media::ClipInfo> info_;            // none: it isn't open
   int fields_ = 1;                                 // that a frame is of
   std::shared_ptr<const host::MovingClip> found_;  // of the shot that is shown; may be null
   std::deque<SaveRequest> saves_;
@@ -152,6 +159,8 @@ class ClipDesk {
   std::unique_ptr<host::Film> film_;
   bool whole_ = false;       // all shots were worked
   std::vector<Shot> shots_;  // those that were
+  // Who was asked to stand still when a shot's window was chosen, by the shot's number.
+  std::map<std::size_t, host::Still> asked_still_;
   // Controls that were ever set, and those that are on the open shot.
   std::set<std::int32_t> touched_, applied_;
   std::vector<std::string> warnings_;

@@ -40,6 +40,7 @@ void ClipDesk::OpenClip(const OpenRequest& request) {
   frames_.Hide();
   film_.reset();
   shots_.clear();
+  asked_still_.clear();
   whole_ = false;
   error_.clear();
   warnings_.clear();
@@ -55,7 +56,8 @@ void ClipDesk::OpenClip(const OpenRequest& request) {
   }
   const media::ClipInfo& whole = film_->whole();
   if (!whole.warning.empty()) warnings_.push_back(whole.warning);
-  tell_({{"info", InfoOf(whole)}, {"path", whole.path}});
+  tell_({{"path", whole.path}});
+  TellInfo();
   // All that was saved stands as it is shown; the rest waits for a word.
   const host::Project& saved = film_->Saved();
   const bool is_whole =
@@ -81,6 +83,14 @@ void ClipDesk::OpenClip(const OpenRequest& request) {
   TellPanel(shot);
   state_ = is_whole ? "working" : "open";
   TellState();
+}
+
+void ClipDesk::TellInfo() {
+  {
+    const std::lock_guard lock(mutex_);
+    info_ = film_->whole();
+  }
+  tell_({{"info", InfoOf(film_->whole())}});
 }
 
 void ClipDesk::OpenAnew(host::Opening opening) {

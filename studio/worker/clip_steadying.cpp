@@ -189,6 +189,10 @@ void ClipDesk::Steady(host::SteadyClip& shot) {
   shot.KeepWhatIsFound();
   try {
     Apply(shot, settings);
+    // To a choice that stands it is all the same who was asked for before.
+    host::Still& asked = asked_still_[film_->number()];
+    const host::Still before = std::exchange(asked, settings.window.still);
+    if (asked == host::Still::automatic && before != asked) shot.ForgetChoice();
     if (!shot.Work(onlooker).analysis && !settings.deleted.empty()) {
       onlooker.Warn("the tracks are new ones; those that were deleted are forgotten");
       ForgetDeleted();

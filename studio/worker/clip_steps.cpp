@@ -170,7 +170,7 @@ void ClipDesk::WorkAll() {
     OpenAnew(host::Opening::decoded);
     host::SteadyClip* const shot = film_->Next();
     frames_.SetSource(shot->effect().shared()->layer()->state()->source, film_->whole());
-    tell_({{"info", InfoOf(film_->whole())}});
+    TellInfo();
     return;  // and once more
   }
   whole_ = true;

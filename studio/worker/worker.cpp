@@ -7,6 +7,7 @@
 #include <utility>
 #include <vector>
 
+#include "studio/wire/encoding.h"
 #include "studio/worker/channel.h"
 #include "studio/worker/clip_desk.h"
 
@@ -63,6 +64,8 @@ class Worker {
       AskFrame(id, head);
     } else if (op == "lasso") {
       Answer(id, TracksOf(head));
+    } else if (op == "try output") {
+      Answer(id, {{"error", OutputTrouble(head)}});
     } else if (op == "forget") {
       desk_.frames().Forget(head.value("of", std::uint64_t{0}));
     } else if (op == "look") {
@@ -78,6 +81,15 @@ class Worker {
     channel.Send({std::move(head), std::move(bytes)});
   }
   void Answer(std::uint64_t id, nlohmann::json head) { AnswerBy(channel_, id, std::move(head)); }
+
+  std::string OutputTrouble(const nlohmann::json& head) {
+    try {
+      return desk_.OutputTrouble(head.value("path", ""),
+                                 EncodeSettingsOf(head.value("encode", nlohmann::json::object())));
+    } catch (const std::invalid_argument& refused) {
+      return refused.what();
+    }
+  }
 
   nlohmann::json TracksOf(const nlohmann::json& head) {
     Lasso lasso;

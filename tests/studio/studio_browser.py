@@ -103,9 +103,15 @@ class Page:
         until(f"{selector} {text} to be enabled", lambda: not self.see(selector, text).get_attribute("disabled"))
         self.see(selector, text).click()
 
-    def keys(self, *keys):
+    def keys(self, *keys, held=None):
         from selenium.webdriver.common.action_chains import ActionChains
-        ActionChains(self.driver).send_keys(*keys).perform()
+        chain = ActionChains(self.driver)
+        if held:
+            chain.key_down(held)
+        chain.send_keys(*keys)
+        if held:
+            chain.key_up(held)
+        chain.perform()
 
     def clip(self):
         """The selected clip's state, as the studio tells it to any window."""

@@ -1,5 +1,6 @@
 #include <stdexcept>
 
+#include "studio/wire/encoding.h"
 #include "studio/wire/message.h"
 #include "studio/wire/settings.h"
 
@@ -45,6 +46,20 @@ TEST(StudioWireTest, SettingsSurviveTheWayThereAndBack) {
   const nlohmann::json none = {{"controls", nlohmann::json::object()},
                                {"window", nlohmann::json::object()}};
   EXPECT_EQ(JsonOf(SettingsOf(nlohmann::json::object())), none);
+}
+
+TEST(StudioWireTest, RefusesWhatNoEncoderCanBeToldOrWouldWriteElsewhere) {
+  const nlohmann::json given = nlohmann::json::parse(
+      R"({"crf": 23, "codec": "libvpx-vp9", "preset": "2", "options": ["row-mt=1", "x=a=b"], "overwrite": true})");
+  EXPECT_EQ(JsonOf(EncodeSettingsOf(given)), given);
+  EXPECT_EQ(EncodeSettingsOf({{"path", "out.mp4"}}).crf, 18);
+  for (const char* text :
+       {R"({"crf": 64})", R"({"crf": "18"})", R"({"codec": "../x"})", R"({"codec": 1})",
+        R"({"preset": "a b"})", R"({"options": "g=1"})", R"({"options": ["g"]})",
+        R"({"options": ["=1"]})", R"({"options": [1]})", R"({"options": ["stats=/tmp/x"]})",
+        R"({"options": ["x264-params=stats=../x"]})"}) {
+    EXPECT_THROW(EncodeSettingsOf(nlohmann::json::parse(text)), std::invalid_argument) << text;
+  }
 }
 
 TEST(StudioWireTest, RefusesSettingsThatNobodyCanHaveMade) {

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cmath>
 #include <cstdint>
 #include <cstdlib>
 #include <nlohmann/json.hpp>
@@ -227,6 +228,83 @@ TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayOutUntilTheyAreBack) {
   again.DeleteTracks({});
   again.Work(onlooker);
   EXPECT_EQ(again.Solved().vertices, all.vertices);
+}
+
+TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayApartFromAGroupThatIsLeftOut) {
+  // Somebody stands in the middle and sways, before a wall that a hand shakes.
+  const std::string path = folder_.In("subject.mkv");
+  constexpr int across = 320, down = 180;
+  const auto noise = [](double x, double y) {
+    const double value = std::sin(0.31 * x + 1.3 * std::sin(0.17 * y)) * std::sin(0.37 * y) +
+                         std::sin(0.23 * y - 0.29 * x) * std::sin(0.53 * x + 0.11 * y);
+    return static_cast<std::uint8_t>(std::clamp(127.5 + 60 * value, 0.0, 255.0));
+  };
+  WriteClip(path, Made(across, down, 24, 25), [&](int frame, HX_Pixel8* pixels) {
+    const double t = frame;
+    const double hand_x = 1.5 * t + 5 * std::sin(2.1 * t), hand_y = 4 * std::sin(1.7 * t + 1);
+    const double sway_x = 6 * std::sin(1.1 * t + 0.5), sway_y = 3 * std::sin(0.8 * t);
+    for (int y = 0; y < down; ++y) {
+      for (int x = 0; x < across; ++x) {
+        const bool near = std::abs(x - across / 2.0 - sway_x) < 64 && y > 45 + sway_y;
+        const std::uint8_t value =
+            near ? noise(x - sway_x + 5000, y - sway_y) : noise(x + hand_x, y + hand_y);
+        pixels[y * across + x] = {255, value, value, value};
+      }
+    }
+  });
+  Onlooker onlooker;
+  const auto left_out = [](SteadyClip& clip) {
+    std::set<TrackPoint> points;
+    const SolvedClip solved = clip.Solved();
+    for (std::int32_t i = 0; i < static_cast<std::int32_t>(solved.statuses.size()); ++i) {
+      if (solved.statuses[static_cast<std::size_t>(i)] == -10) {
+        points.insert({solved.first_frame + i / solved.slots, i % solved.slots});
+      }
+    }
+    return points;
+  };
+  for (const bool follows : {false, true}) {
+    const auto hold = [&](SteadyClip& clip, Still still) {
+      if (follows) return clip.FollowPicture({.may_choose = false, .still = still}, onlooker);
+      if (clip.ForgetChoice()) clip.Work(onlooker);
+      clip.HoldStill(still, onlooker);
+    };
+    Film film(CALMFRAME_PLUGIN, path);
+    SteadyClip& clip = *film.Next();
+    clip.Work(onlooker);
+    hold(clip, Still::background);
+    const std::set<TrackPoint> group = left_out(clip);
+    ASSERT_GT(group.size(), 5u);
+    // One that the group has, and some that it hasn't.
+    std::set<TrackPoint> deleted = {*group.begin()};
+    const SolvedClip solved = clip.Solved();
+    for (std::int32_t slot = 0; slot < solved.slots && deleted.size() < 4; ++slot) {
+      if (solved.statuses[static_cast<std::size_t>(slot)] > 0) deleted.insert({0, slot});
+    }
+    std::set<TrackPoint> both = group;
+    both.insert(deleted.begin(), deleted.end());
+    ASSERT_EQ(both.size(), group.size() + 3);
+    clip.DeleteTracks(deleted);
+    clip.Work(onlooker);
+    hold(clip, Still::background);
+    EXPECT_EQ(left_out(clip), both) << follows;
+    film.Keep();
+    const Project saved = film.Saved();
+
+    Film later(CALMFRAME_PLUGIN, saved, path);
+    SteadyClip& again = *later.Next();
+    EXPECT_TRUE(again.Work(onlooker).solve);
+    EXPECT_EQ(again.DeletedTracks(), deleted) << follows;
+    hold(again, Still::background);
+    EXPECT_EQ(left_out(again), both) << "drawn as it was shown: " << follows;
+    EXPECT_EQ(again.Solved().vertices, clip.Solved().vertices) << follows;
+    hold(again, Still::all);
+    EXPECT_EQ(left_out(again), deleted) << "the group is back alone: " << follows;
+    again.DeleteTracks({});
+    again.Work(onlooker);
+    hold(again, Still::background);
+    EXPECT_EQ(left_out(again), group) << "they are back alone: " << follows;
+  }
 }
 
 TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {

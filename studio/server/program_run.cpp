@@ -1,0 +1,89 @@
+#include "studio/server/program_run.h"
+
+#include <boost/asio/post.hpp>
+#include <chrono>
+#include <exception>
+#include <optional>
+#include <utility>
+
+#include "host/base/json_depth.h"
+#include "host/batch/child.h"
+
+namespace calmframe::studio {
+
+// What is posted finds it, or nobody.
+struct ProgramRun::Listener {
+  Events events;
+  std::string error;  // that it told last
+
+  void Hear(const std::string& line) {
+    const nlohmann::json told =
+        NestsTooDeep(line) ? nlohmann::json() : nlohmann::json::parse(line, nullptr, false);
+    if (!told.is_object()) {
+      error = line;
+      return;
+    }
+    try {
+      error = told.value("error", error);
+      events.told(told);
+    } catch (const nlohmann::json::exception&) {  // of another shape
+    }
+  }
+
+  void End(int code) {
+    if (code == 0) {
+      error.clear();
+    } else if (code > 128) {
+      error = "it crashed (signal " + std::to_string(code - 128) + ")";
+    } else if (error.empty()) {
+      error = "it ended with code " + std::to_string(code);
+    }
+    events.ended(error);
+  }
+};
+
+ProgramRun::ProgramRun(boost::asio::io_context& context, std::vector<std::string> words,
+                       Events events)
+    : listener_(std::make_shared<Listener>(Listener{std::move(events), {}})) {
+  const std::weak_ptr<Listener> weak = listener_;
+  const auto post = [&context, weak](auto act) {
+    boost::asio::post(context, [weak, act] {
+      if (const std::shared_ptr<Listener> listener = weak.lock()) act(*listener);
+    });
+  };
+  thread_ = std::thread([post, words = std::move(words), stops = stops_] {
+    int code = 127;
+    try {
+      batch::Child child(words);
+      using Clock = std::chrono::steady_clock;
+      constexpr std::chrono::seconds kUntilKilled(20);
+      std::string line;
+      std::optional<Clock::time_point> stopped;
+      while (true) {
+        const batch::Child::Said said = child.Next(line, 100);
+        if (*stops) {
+          child.AskToEnd();
+          if (!stopped) stopped = Clock::now();
+          if (Clock::now() - *stopped > kUntilKilled) break;
+        }
+        if (said == batch::Child::Said::end) break;
+        if (said == batch::Child::Said::line) {
+          post([line](Listener& listener) { listener.Hear(line); });
+        }
+      }
+      child.Kill();  // see WorkerProcess::Start
+      code = child.Wait();
+    } catch (const std::exception& error) {
+      post([line = std::string(error.what())](Listener& listener) { listener.Hear(line); });
+    }
+    post([code](Listener& listener) { listener.End(code); });
+  });
+}
+
+ProgramRun::~ProgramRun() {
+  *stops_ = true;
+  listener_.reset();
+  thread_.join();
+}
+
+}  // namespace calmframe::studio
