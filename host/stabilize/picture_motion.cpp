@@ -4,7 +4,9 @@
 #include <array>
 #include <cmath>
 #include <cstddef>
+#include <memory>
 #include <optional>
+#include <utility>
 
 #include "host/stabilize/homography.h"
 #include "host/stabilize/median.h"
@@ -19,18 +21,28 @@ struct TrackPairs {
   std::vector<Point> before, now;  // equally many
 };
 
-TrackPairs PairsOf(const WarpedPlane& plane, std::size_t frame) {
-  const SolvedClip& clip = plane.clip();
+// A frame's tracks in the plane.
+struct PlaneRow {
+  std::vector<std::int32_t> statuses;
+  std::vector<Point> places;  // of those that are there
+};
+
+PlaneRow RowOf(const WarpedPlane& plane, std::size_t frame) {
+  TrackRow row = plane.clip().TracksOf(frame);
+  const PlaneFrame in_plane = plane.Frame(frame);
+  for (std::size_t s = 0; s < row.places.size(); ++s) {
+    if (row.statuses[s] >= 0) row.places[s] = in_plane.At(row.places[s]);
+  }
+  return {std::move(row.statuses), std::move(row.places)};
+}
+
+TrackPairs PairsOf(const PlaneRow& before, const PlaneRow& now) {
   TrackPairs pairs;
-  const auto slots = static_cast<std::size_t>(clip.slots);
-  for (std::size_t s = 0; s < slots; ++s) {
-    const std::size_t now = frame * slots + s, before = now - slots;
-    if (clip.statuses[now] != 0 || clip.statuses[before] < 0) continue;
-    const Point here = plane.At(frame, clip.tracks[now]);
-    const Point there = plane.At(frame - 1, clip.tracks[before]);
-    if (!IsInReach(here) || !IsInReach(there)) continue;
-    pairs.now.push_back(here);
-    pairs.before.push_back(there);
+  for (std::size_t s = 0; s < now.statuses.size(); ++s) {
+    if (now.statuses[s] != 0 || before.statuses[s] < 0) continue;
+    if (!IsInReach(now.places[s]) || !IsInReach(before.places[s])) continue;
+    pairs.now.push_back(now.places[s]);
+    pairs.before.push_back(before.places[s]);
   }
   return pairs;
 }
@@ -73,66 +85,87 @@ Cells Residuals(const TrackPairs& pairs, const Similarity& start, double width, 
   return cells;
 }
 
-std::vector<double> Flicker(const std::vector<Cells>& cells) {
-  std::vector<double> flicker(cells.size(), 0);
-  for (std::size_t f = 1; f + 1 < cells.size(); ++f) {
-    double sum = 0;
-    int count = 0;
-    for (std::size_t c = 0; c < cells[f].size(); ++c) {
-      const auto &now = cells[f][c], &before = cells[f - 1][c], &after = cells[f + 1][c];
-      if (!now || !before || !after) continue;
-      const double x = now->x - (before->x + after->x) / 2;
-      const double y = now->y - (before->y + after->y) / 2;
-      sum += (x * x + y * y) / 1.5;  // of three independent values the variance is that of one
-      ++count;
-    }
-    if (count > 0) flicker[f] = std::sqrt(sum / count);
+// Of a frame between two others.
+double Flicker(const Cells& before, const Cells& now, const Cells& after) {
+  double sum = 0;
+  int count = 0;
+  for (std::size_t c = 0; c < now.size(); ++c) {
+    if (!now[c] || !before[c] || !after[c]) continue;
+    const double x = now[c]->x - (before[c]->x + after[c]->x) / 2;
+    const double y = now[c]->y - (before[c]->y + after[c]->y) / 2;
+    sum += (x * x + y * y) / 1.5;  // of three independent values the variance is that of one
+    ++count;
   }
-  return flicker;
+  return count > 0 ? std::sqrt(sum / count) : 0;
 }
 
-// Of at least five frames.
-std::vector<TrackPath> PathsOf(const WarpedPlane& plane) {
-  const SolvedClip& clip = plane.clip();
-  std::vector<TrackPath> paths;
-  const auto slots = static_cast<std::size_t>(clip.slots);
-  const auto frames = static_cast<std::size_t>(clip.frame_count);
-  for (std::size_t s = 0; s < slots; ++s) {
-    TrackPath path;
-    const auto end = [&] {
-      if (path.points.size() >= 5) paths.push_back(path);
-      path.points.clear();
-    };
-    for (std::size_t f = 0; f < frames; ++f) {
-      const std::int32_t status = clip.statuses[f * slots + s];
-      if (status != 0) end();
-      if (status < 0) continue;
-      if (path.points.empty()) path.first = f;
-      path.points.push_back(plane.At(f, clip.tracks[f * slots + s]));
+// Gathers the paths of at least five frames, from row to row.
+class PathGatherer {
+ public:
+  explicit PathGatherer(std::size_t slots) : open_(slots) {}
+
+  void Add(std::size_t frame, const PlaneRow& row) {
+    for (std::size_t s = 0; s < open_.size(); ++s) {
+      if (row.statuses[s] != 0) End(s);
+      if (row.statuses[s] < 0) continue;
+      TrackPath& path = open_[s];
+      if (path.points.empty()) path.first = frame;
+      path.points.push_back(row.places[s]);
       if (!IsInReach(path.points.back())) path.points.clear();
     }
-    end();
   }
-  return paths;
-}
+
+  std::vector<TrackPath> Take() {
+    for (std::size_t s = 0; s < open_.size(); ++s) End(s);
+    return std::move(paths_);
+  }
+
+ private:
+  void End(std::size_t slot) {
+    if (open_[slot].points.size() >= 5) paths_.push_back(open_[slot]);
+    open_[slot].points.clear();
+  }
+
+  std::vector<TrackPath> open_;  // by slot
+  std::vector<TrackPath> paths_;
+};
 
 }  // namespace
 
 PictureMotion FindMotion(const WarpedPlane& plane) {
   const SolvedClip& clip = plane.clip();
   const auto frames = static_cast<std::size_t>(clip.frame_count);
-  PictureMotion motion{std::vector<Similarity>(frames), {}, {}};
-  std::vector<Cells> cells(frames);
-  tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
-      [&](std::size_t before) {
-        const std::size_t f = before + 1;
-        const TrackPairs pairs = PairsOf(plane, f);
-        motion.background[f] = FitMotion(pairs.now, pairs.before, kTrackTolerance * clip.width);
-        cells[f] = Residuals(pairs, Inverse(motion.background[f]), clip.width, clip.height);
-      },
-      frames - 1);
-  motion.wobble = Flicker(cells);
-  motion.paths = PathsOf(plane);
+  PictureMotion motion{std::vector<Similarity>(frames), std::vector<double>(frames, 0), {}};
+  PathGatherer paths(static_cast<std::size_t>(clip.slots));
+  // A stretch of frames after the other, so that no more than its rows are there at a time.
+  constexpr std::size_t kStretch = 256;
+  PlaneRow last;
+  Cells before_last_cells, last_cells;
+  for (std::size_t first = 0; first < frames; first += kStretch) {
+    const std::size_t count = std::min(kStretch, frames - first);
+    std::vector<PlaneRow> rows(count);
+    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+        [&](std::size_t i) { rows[i] = RowOf(plane, first + i); }, count);
+    std::vector<Cells> cells(count);
+    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+        [&](std::size_t i) {
+          const std::size_t f = first + i;
+          if (f == 0) return;
+          const TrackPairs pairs = PairsOf(i > 0 ? rows[i - 1] : last, rows[i]);
+          motion.background[f] = FitMotion(pairs.now, pairs.before, kTrackTolerance * clip.width);
+          cells[i] = Residuals(pairs, Inverse(motion.background[f]), clip.width, clip.height);
+        },
+        count);
+    for (std::size_t i = 0; i < count; ++i) {
+      paths.Add(first + i, rows[i]);
+      if (first + i >= 2) {
+        motion.wobble[first + i - 1] = Flicker(before_last_cells, last_cells, cells[i]);
+      }
+      before_last_cells = std::exchange(last_cells, std::move(cells[i]));
+    }
+    last = std::move(rows.back());
+  }
+  motion.paths = std::make_shared<const std::vector<TrackPath>>(paths.Take());
   return motion;
 }
 

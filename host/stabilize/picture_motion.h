@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <memory>
 #include <vector>
 
 #include "host/stabilize/warped_plane.h"
@@ -23,7 +24,8 @@ struct PictureMotion {
   // tracks, less the mean of the two neighbours in time, so that parallax, which lasts, drops out;
   // root mean square over the cells. 0 where nothing can be told.
   std::vector<double> wobble;
-  std::vector<TrackPath> paths;  // of the tracks, pixels about the frame's middle
+  // Of the tracks, pixels about the frame's middle; never null. What is shown of them shares it.
+  std::shared_ptr<const std::vector<TrackPath>> paths;
 };
 
 // By the tracks of the plane's clip that are not deleted. Uses all processors; the same on any

@@ -83,7 +83,7 @@ HostSettings SettingsFor(const media::ClipInfo& info) {
   settings.media.cache_bytes =
       kFrames * static_cast<std::size_t>(info.width) * static_cast<std::size_t>(info.height) * 4;
   // Of what is saved time and again while a clip is worked, a project alone is to be small.
-  settings.keeps_analysis_raw = true;
+  settings.saves_as = PayloadForm::packed;
   return settings;
 }
 
@@ -270,8 +270,7 @@ bool SteadyClip::ForgetChoice() {
 }
 
 void SteadyClip::TakeAsSaved() {
-  SavedEffect saved;
-  const CommandResult result = effect_->Save(&saved);
+  const CommandResult result = effect_->Save(nullptr);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
 }
 
@@ -446,12 +445,10 @@ void SteadyClip::SolveAnew(Watcher& watcher) {
 }
 
 SolvedClip SteadyClip::Solved() {
-  SavedEffect saved;
-  return Solved(*effect_, &saved, path());
+  return Solved(*effect_, nullptr, path());
 }
 
 std::shared_ptr<const MovingClip> SteadyClip::SolvedAndFramed(SavedEffect* saved) {
-  SavedEffect effect;
   if (found_of_ && !found_instance_.empty()) {
     if (saved) {
       saved->match_name = host_.library().properties().match_name;
@@ -460,7 +457,8 @@ std::shared_ptr<const MovingClip> SteadyClip::SolvedAndFramed(SavedEffect* saved
     }
     return found_of_;
   }
-  SolvedClip solved = Solved(*effect_, &effect, path());
+  SavedEffect effect;
+  SolvedClip solved = Solved(*effect_, saved || keeps_found_ ? &effect : nullptr, path());
   if (!Crops(ValueOf(HX_FRAMING.disk_id))) solved.crop.reset();  // from a framing before
   const auto moving = found_of_ ? std::make_shared<const MovingClip>(std::move(solved), *found_of_)
                                 : std::make_shared<const MovingClip>(std::move(solved));
@@ -473,10 +471,11 @@ std::shared_ptr<const MovingClip> SteadyClip::SolvedAndFramed(SavedEffect* saved
 }
 
 SolvedClip SteadyClip::Solved(Effect& effect, SavedEffect* saved, const std::string& name) {
-  const CommandResult result = effect.Save(saved);
+  SavedEffect unwanted;
+  const CommandResult result = effect.Save(saved ? saved : &unwanted);
   if (!result.ok()) throw SolveFailure(result.Line(name));
   try {
-    return ReadSolvedClip(saved->instance);
+    return ReadSolvedClip(saved ? saved->instance : std::move(unwanted.instance));
   } catch (const NoSolvedClip& failure) {
     throw SolveFailure(name + ": " + failure.what());
   }
@@ -532,11 +531,13 @@ const std::set<TrackPoint>& SteadyClip::DeletedTracks() {
   knows_deleted_ = true;
   try {
     const SolvedClip solved = Solved();
-    for (std::size_t i = 0; i < solved.statuses.size(); ++i) {
-      if (solved.statuses[i] != kDeletedTrackBegins) continue;
-      const auto slots = static_cast<std::size_t>(solved.slots);
-      deleted_.insert({solved.first_frame + static_cast<std::int32_t>(i / slots),
-                       static_cast<std::int32_t>(i % slots)});
+    for (std::int32_t row = 0; row < solved.frame_count; ++row) {
+      const TrackRow tracks = solved.TracksOf(static_cast<std::size_t>(row));
+      for (std::int32_t slot = 0; slot < solved.slots; ++slot) {
+        if (tracks.statuses[static_cast<std::size_t>(slot)] == kDeletedTrackBegins) {
+          deleted_.insert({solved.first_frame + row, slot});
+        }
+      }
     }
   } catch (const SolveFailure&) {  // nothing is solved, and nothing deleted
   }
@@ -614,8 +615,9 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
     chooser.Consider({.name = "not bent", .warps = Warps::none}, *solved, true);
   }
   Effect* copy = nullptr;
+  solved.reset();  // and what is known of its motion, unless that is kept
   if (request.may_choose && chooser.leaves_shake()) copy = TryControls(saved, chooser, watcher);
-  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved->clip());
+  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed();
   if (copy && chooser.choice().best().changes.empty()) {  // then the controls stay, too
     session_.Remove(*copy);
   } else if (copy) {
@@ -659,11 +661,10 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
     for (const auto& [trial, copy] : copies) {
       bool is_best = false;
       if (!watcher.Stops() && Session::StatusOf(*copy) == kReady) {
-        SavedEffect of_copy;
         try {
           is_best =
               chooser.Consider({.name = trial->name, .changes = {{trial->disk_id, trial->value}}},
-                               Solved(*copy, &of_copy, path()), true);
+                               Solved(*copy, nullptr, path()), true);
         } catch (const SolveFailure&) {  // one that can't be had is none to choose
         }
       }
@@ -737,6 +738,7 @@ void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& win
   DrawByItself(watcher);
   drawn_ = &next;
   windows_ = windows;
+  malloc_trim(0);  // what the choosing took; see Settle
   drawn_scale_ = shown.follows ? ValueOf(HX_ADDITIONAL_SCALE.disk_id) : 100;
 }
 
@@ -754,7 +756,9 @@ Outcome SteadyClip::Measure() {
   const SolvedClip& solved = moving->clip();
   const double zoom = Zoom(solved);
   const WarpedPlane plane(solved, Warps::solved);
-  Outcome outcome = MeasureOutcome(MotionOfSource(solved, *moving->motion(Warps::none)),
+  const Outcome source =
+      MeasureSource(MotionOfSource(solved, *moving->motion(Warps::none)), FramesPerSecond());
+  Outcome outcome = MeasureOutcome(source,
                                    MotionShown(plane, *moving->motion(Warps::solved),
                                                OwnWindows(solved, zoom), FillingOfEdges()),
                                    FramesPerSecond());
@@ -804,9 +808,9 @@ double SteadyClip::Zoom(const SolvedClip& solved) const {
 
 SavedShot SteadyClip::Saved() {
   SavedShot shot;
-  host_.KeepAnalysisRaw(false);
+  host_.SaveAs(PayloadForm::deflated);
   const CommandResult saved = effect_->Save(&shot.effect);
-  host_.KeepAnalysisRaw(true);
+  host_.SaveAs(PayloadForm::packed);
   if (!saved.ok()) throw SolveFailure(saved.Line(path()));
   const auto layer = effect_->shared()->layer()->state();
   shot.start_frame = layer->start_frame;

@@ -196,7 +196,8 @@ class SteadyClip {
   void TakeAsSaved();
   // Of a parameter, as it was declared. Throws SolveFailure.
   void Set(std::int32_t disk_id, double value);
-  // What the effect would save, and what of it is solved. Throws SolveFailure.
+  // What the effect would save, null where nobody wants it, and what of it is solved. Throws
+  // SolveFailure.
   static SolvedClip Solved(Effect& effect, SavedEffect* saved, const std::string& name);
   // Solved, with a crop only where the framing has one. `saved`, where it isn't null: the effect.
   std::shared_ptr<const MovingClip> SolvedAndFramed(SavedEffect* saved = nullptr);
