@@ -3,10 +3,12 @@
 #include <algorithm>
 #include <cmath>
 #include <cstddef>
+#include <memory>
 #include <optional>
 #include <utility>
 
 #include "host/stabilize/solved_grid.h"
+#include "host/stabilize/track_paths.h"
 #include "host/stabilize/warped_plane.h"
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
@@ -56,6 +58,29 @@ std::vector<double> CalmedGrowth(const std::vector<double>& scales, const Pictur
     calmed[static_cast<std::size_t>(f)] = sum / weights;
   }
   return calmed;
+}
+
+// Calls visit(f, its frame of the plane) for each frame on all processors: a frame is expanded once
+// for that and for its tracks.
+template <class Visit>
+std::shared_ptr<const std::vector<TrackPath>> PathsOf(const WarpedPlane& plane,
+                                                      const Visit& visit) {
+  const SolvedClip& clip = plane.clip();
+  const auto frames = static_cast<std::size_t>(clip.frame_count);
+  PathGatherer paths(clip.slots);
+  constexpr std::size_t kStretch = 256;  // rows that are there at a time
+  for (std::size_t first = 0; first < frames; first += kStretch) {
+    std::vector<TrackRow> rows(std::min(kStretch, frames - first));
+    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+        [&](std::size_t i) {
+          const PlaneFrame frame = plane.Frame(first + i);
+          visit(first + i, frame);
+          rows[i] = RowInPlane(frame, clip.TracksOf(first + i));
+        },
+        rows.size());
+    for (const TrackRow& row : rows) paths.Add(row);
+  }
+  return std::make_shared<const std::vector<TrackPath>>(paths.Take());
 }
 
 }  // namespace
@@ -158,7 +183,6 @@ std::vector<ShownMotion> MotionsShown(const WarpedPlane& plane, const PictureMot
   for (ShownMotion& shown : all) {
     shown.width = clip.width;
     shown.height = clip.height;
-    shown.paths = motion.paths;
     shown.to_output.resize(frames);
     shown.motions.resize(frames);
     shown.zooms.resize(frames);
@@ -193,15 +217,11 @@ std::vector<ShownMotion> MotionsShown(const WarpedPlane& plane, const PictureMot
     const Point aim = frame.SourceAt(window({}));
     shown.aims[f] = {aim.x * square - middle.x, aim.y - middle.y};
   };
-  tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
-      [&](std::size_t f) {
-        const PlaneFrame frame = plane.Frame(f);
-        const double scale = frame.Scale();
-        for (std::size_t way = 0; way < ways.size(); ++way) {
-          show(f, frame, scale, ways[way], all[way]);
-        }
-      },
-      frames);
+  const auto paths = PathsOf(plane, [&](std::size_t f, const PlaneFrame& frame) {
+    const double scale = frame.Scale();
+    for (std::size_t way = 0; way < ways.size(); ++way) show(f, frame, scale, ways[way], all[way]);
+  });
+  for (ShownMotion& shown : all) shown.paths = paths;
   return all;
 }
 
@@ -221,7 +241,7 @@ ShownMotion MotionOfSource(const SolvedClip& clip, const PictureMotion& motion) 
           std::vector<double>(frames, 1.0),
           std::vector<double>(frames, 0.0),
           motion.wobble,
-          motion.paths,
+          PathsOf(WarpedPlane(clip, Warps::none), [](std::size_t, const PlaneFrame&) {}),
           std::vector<Point>(frames)};
 }
 

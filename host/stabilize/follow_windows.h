@@ -57,8 +57,8 @@ std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom);
 // there what is drawn rounds to the frame or beside it.
 std::vector<Similarity> WholeFrames(const SolvedClip& clip);
 
-// What each of several ways to show a clip by windows shows. `motion`: that of the plane, whose
-// paths the results share. `filled`: what covers it where the edges are filled; else null.
+// What each of several ways to show a clip by windows shows; they share the paths. `motion`: that
+// of the plane. `filled`: what covers it where the edges are filled; else null.
 std::vector<ShownMotion> MotionsShown(const WarpedPlane& plane, const PictureMotion& motion,
                                       const std::vector<std::vector<Similarity>>& ways,
                                       const FilledPlane* filled);

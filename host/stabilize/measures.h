@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "host/stabilize/picture_motion.h"
+#include "host/stabilize/track_paths.h"
 
 namespace calmframe::host {
 

@@ -4,12 +4,12 @@
 #include <array>
 #include <cmath>
 #include <cstddef>
-#include <memory>
 #include <optional>
 #include <utility>
 
 #include "host/stabilize/homography.h"
 #include "host/stabilize/median.h"
+#include "host/stabilize/track_paths.h"
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
 
@@ -21,22 +21,7 @@ struct TrackPairs {
   std::vector<Point> before, now;  // equally many
 };
 
-// A frame's tracks in the plane.
-struct PlaneRow {
-  std::vector<std::int32_t> statuses;
-  std::vector<Point> places;  // of those that are there
-};
-
-PlaneRow RowOf(const WarpedPlane& plane, std::size_t frame) {
-  TrackRow row = plane.clip().TracksOf(frame);
-  const PlaneFrame in_plane = plane.Frame(frame);
-  for (std::size_t s = 0; s < row.places.size(); ++s) {
-    if (row.statuses[s] >= 0) row.places[s] = in_plane.At(row.places[s]);
-  }
-  return {std::move(row.statuses), std::move(row.places)};
-}
-
-TrackPairs PairsOf(const PlaneRow& before, const PlaneRow& now) {
+TrackPairs PairsOf(const TrackRow& before, const TrackRow& now) {
   TrackPairs pairs;
   for (std::size_t s = 0; s < now.statuses.size(); ++s) {
     if (now.statuses[s] != 0 || before.statuses[s] < 0) continue;
@@ -99,53 +84,24 @@ double Flicker(const Cells& before, const Cells& now, const Cells& after) {
   return count > 0 ? std::sqrt(sum / count) : 0;
 }
 
-// Gathers the paths of at least five frames, from row to row.
-class PathGatherer {
- public:
-  explicit PathGatherer(std::size_t slots) : open_(slots) {}
-
-  void Add(std::size_t frame, const PlaneRow& row) {
-    for (std::size_t s = 0; s < open_.size(); ++s) {
-      if (row.statuses[s] != 0) End(s);
-      if (row.statuses[s] < 0) continue;
-      TrackPath& path = open_[s];
-      if (path.points.empty()) path.first = frame;
-      path.points.push_back(row.places[s]);
-      if (!IsInReach(path.points.back())) path.points.clear();
-    }
-  }
-
-  std::vector<TrackPath> Take() {
-    for (std::size_t s = 0; s < open_.size(); ++s) End(s);
-    return std::move(paths_);
-  }
-
- private:
-  void End(std::size_t slot) {
-    if (open_[slot].points.size() >= 5) paths_.push_back(open_[slot]);
-    open_[slot].points.clear();
-  }
-
-  std::vector<TrackPath> open_;  // by slot
-  std::vector<TrackPath> paths_;
-};
-
 }  // namespace
 
 PictureMotion FindMotion(const WarpedPlane& plane) {
   const SolvedClip& clip = plane.clip();
   const auto frames = static_cast<std::size_t>(clip.frame_count);
-  PictureMotion motion{std::vector<Similarity>(frames), std::vector<double>(frames, 0), {}};
-  PathGatherer paths(static_cast<std::size_t>(clip.slots));
+  PictureMotion motion{std::vector<Similarity>(frames), std::vector<double>(frames, 0)};
   // A stretch of frames after the other, so that no more than its rows are there at a time.
   constexpr std::size_t kStretch = 256;
-  PlaneRow last;
+  TrackRow last;
   Cells before_last_cells, last_cells;
   for (std::size_t first = 0; first < frames; first += kStretch) {
     const std::size_t count = std::min(kStretch, frames - first);
-    std::vector<PlaneRow> rows(count);
+    std::vector<TrackRow> rows(count);
     tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
-        [&](std::size_t i) { rows[i] = RowOf(plane, first + i); }, count);
+        [&](std::size_t i) {
+          rows[i] = RowInPlane(plane.Frame(first + i), clip.TracksOf(first + i));
+        },
+        count);
     std::vector<Cells> cells(count);
     tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
         [&](std::size_t i) {
@@ -157,7 +113,6 @@ PictureMotion FindMotion(const WarpedPlane& plane) {
         },
         count);
     for (std::size_t i = 0; i < count; ++i) {
-      paths.Add(first + i, rows[i]);
       if (first + i >= 2) {
         motion.wobble[first + i - 1] = Flicker(before_last_cells, last_cells, cells[i]);
       }
@@ -165,7 +120,6 @@ PictureMotion FindMotion(const WarpedPlane& plane) {
     }
     last = std::move(rows.back());
   }
-  motion.paths = std::make_shared<const std::vector<TrackPath>>(paths.Take());
   return motion;
 }
 

@@ -1,18 +1,11 @@
 #pragma once
 
 #include <cstddef>
-#include <memory>
 #include <vector>
 
 #include "host/stabilize/warped_plane.h"
 
 namespace calmframe::host {
-
-// Where one feature is in consecutive frames.
-struct TrackPath {
-  std::size_t first = 0;  // frame
-  std::vector<Point> points;
-};
 
 // How the picture moves in a plane, frame by frame.
 struct PictureMotion {
@@ -24,8 +17,6 @@ struct PictureMotion {
   // tracks, less the mean of the two neighbours in time, so that parallax, which lasts, drops out;
   // root mean square over the cells. 0 where nothing can be told.
   std::vector<double> wobble;
-  // Of the tracks, pixels about the frame's middle; never null. What is shown of them shares it.
-  std::shared_ptr<const std::vector<TrackPath>> paths;
 };
 
 // By the tracks of the plane's clip that are not deleted. Uses all processors; the same on any

@@ -61,6 +61,14 @@ constexpr std::int32_t kDeletedTrackBegins = -10;  // see SolvedClip::statuses
 // The effect's words for what its status counter tells when it has ended without a result.
 enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
 
+constexpr std::size_t kLong = 3000;  // frames
+
+// What was freed of a long clip in small pieces goes back to the system; see Settle. Else it would
+// stand beside what the next step takes.
+void GiveBack(std::size_t frames) {
+  if (frames >= kLong) malloc_trim(0);
+}
+
 // A tracking window of the least size needs that much.
 constexpr int kLeastSide = 20;
 
@@ -597,6 +605,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   Still still = as_set ? Still::all : request.still;
   const MotionGroups groups =
       still == Still::all ? MotionGroups() : FindMotionGroups(solved->clip());
+  GiveBack(range_.size());
   if (still == Still::automatic) {
     constexpr double kCovers = 0.5;  // of the frame: less of the background hardly holds a picture
     still =
@@ -616,6 +625,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   }
   Effect* copy = nullptr;
   solved.reset();  // and what is known of its motion, unless that is kept
+  GiveBack(range_.size());
   if (request.may_choose && chooser.leaves_shake()) copy = TryControls(saved, chooser, watcher);
   if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed();
   if (copy && chooser.choice().best().changes.empty()) {  // then the controls stay, too
@@ -648,7 +658,6 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
   const auto stops = [&] { return watcher.Stops(); };
   // Whatever the machine, two at a time, and of a long clip one: each holds the tracks and warps of
   // the whole clip.
-  constexpr std::size_t kLong = 3000;  // frames
   const std::size_t at_once = range_.size() < kLong ? 2 : 1;
   for (std::size_t first = 0; first < trials.size(); first += at_once) {
     std::vector<std::pair<const Trial*, Effect*>> copies;
@@ -671,6 +680,7 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
       if (is_best && best) session_.Remove(*best);
       if (is_best) best = copy;
       if (!is_best) session_.Remove(*copy);
+      GiveBack(range_.size());
     }
     watcher.Show({.stage = "choosing",
                   .done = static_cast<double>(std::min(first + at_once, trials.size())) /
@@ -727,6 +737,7 @@ void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& win
   }
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
   Effect& next = session_.Load(LayerOfItsOwn(), saved);
+  saved = {};
   session_.TickUntilSettled(std::chrono::hours(24), [&] { return watcher.Stops(); });
   const int status = Session::StatusOf(next);
   if (watcher.Stops() || status != kReady) {
@@ -738,7 +749,7 @@ void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& win
   DrawByItself(watcher);
   drawn_ = &next;
   windows_ = windows;
-  malloc_trim(0);  // what the choosing took; see Settle
+  GiveBack(range_.size());
   drawn_scale_ = shown.follows ? ValueOf(HX_ADDITIONAL_SCALE.disk_id) : 100;
 }
 
