@@ -61,12 +61,11 @@ constexpr std::int32_t kDeletedTrackBegins = -10;  // see SolvedClip::statuses
 // The effect's words for what its status counter tells when it has ended without a result.
 enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
 
-constexpr std::size_t kLong = 3000;  // frames
-
-// What was freed of a long clip in small pieces goes back to the system; see Settle. Else it would
-// stand beside what the next step takes.
+// What was freed of a clip in small pieces goes back to the system; see Settle. Else it would stand
+// beside what the next step takes. Of short ones it is not worth the time.
 void GiveBack(std::size_t frames) {
-  if (frames >= kLong) malloc_trim(0);
+  constexpr std::size_t kLeast = 500;
+  if (frames >= kLeast) malloc_trim(0);
 }
 
 // A tracking window of the least size needs that much.
@@ -328,6 +327,7 @@ void SteadyClip::Settle(Watcher& watcher, Progress& shown, Reuse& reuse) {
       break;
     }
     TakeAsSaved();  // ahead of what is solved of them
+    GiveBack(range_.size());
     analysed_ = false;
   }
   // The render that follows has its own pattern of buffers: what the analysis took goes back.
@@ -658,6 +658,7 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
   const auto stops = [&] { return watcher.Stops(); };
   // Whatever the machine, two at a time, and of a long clip one: each holds the tracks and warps of
   // the whole clip.
+  constexpr std::size_t kLong = 3000;  // frames
   const std::size_t at_once = range_.size() < kLong ? 2 : 1;
   for (std::size_t first = 0; first < trials.size(); first += at_once) {
     std::vector<std::pair<const Trial*, Effect*>> copies;
