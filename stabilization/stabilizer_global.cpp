@@ -10,9 +10,12 @@ void FillStabilizerGlobal(stabilizer_global& global, std::uint64_t feature_count
   const std::size_t cells = feature_count * frame_count;
   global.input.resize(cells);
   global.output.assign(cells, track_sample{0.0f, 0.0f, -1, 0.0f});
-  const auto& source = *all_features.features;
-  for (std::size_t i = 0; i < cells; ++i) {
-    global.input[i] = {source[i].x * x_scale, source[i].y, source[i].status, source[i].correlation};
+  std::vector<tracking::tracking_feature<float>> row(feature_count);
+  for (std::size_t f = 0; f < frame_count; ++f) {
+    all_features.ReadRow(f, row.data());
+    track_sample* sample = global.input.data() + f * feature_count;
+    for (const auto& cell : row)
+      *sample++ = {cell.x * x_scale, cell.y, cell.status, cell.correlation};
   }
 }
 

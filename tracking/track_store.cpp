@@ -1,10 +1,27 @@
 #include "tracking/track_store.h"
 
+#include <algorithm>
 #include <boost/make_shared.hpp>
 
 namespace marrow::tracking {
 
 AllFeatures::AllFeatures() : features(boost::make_shared<TrackCells>()) {}
+
+void AllFeatures::ReadRow(std::size_t row, tracking_feature<float>* cells) const {
+  if (packed) return packed->Read(row, cells);
+  const auto slots = static_cast<std::size_t>(feature_count);
+  std::copy_n(features->data() + row * slots, slots, cells);
+}
+
+boost::shared_ptr<const TrackCells> CellsOf(const AllFeatures& table) {
+  if (!table.packed) return table.features;
+  const auto slots = static_cast<std::size_t>(table.feature_count);
+  const auto cells = boost::make_shared<TrackCells>(table.packed->rows() * slots);
+  for (std::size_t row = 0; row < table.packed->rows(); ++row) {
+    table.packed->Read(row, cells->data() + row * slots);
+  }
+  return cells;
+}
 
 void RemoveShortTracks(AllFeatures& all_features, std::int32_t kill_tracks_shorter_than) {
   if (kill_tracks_shorter_than == 0) return;

@@ -8,21 +8,13 @@
 #include <utility>
 #include <vector>
 
+#include "tracking/packed_cells.h"
+#include "tracking/tracking_feature.h"
+
 // The table of everything the analysis learned from the pixels: one row for each analysed frame,
 // one column for each feature slot. Frame-major: the cell of frame f and slot s stands at f *
 // feature_count + s, f counted from 0 in the run.
 namespace marrow::tracking {
-
-// One cell. x and y are source pixels of this frame, pixel centres at whole numbers, meaningful
-// where status >= 0. correlation is the mean normalised cross-correlation of the feature's first
-// window with this frame, -1 to 1, written by the affine verification alone.
-template <class Real>
-struct tracking_feature {
-  Real x;
-  Real y;
-  std::int32_t status;  // see feature_status
-  Real correlation;
-};
 
 // Values of status. Above 0: a seed; the value is the frame's index in the run plus 1.
 namespace feature_status {
@@ -65,10 +57,17 @@ struct AllFeatures {
   std::int32_t feature_count = 0;
   std::int32_t first_frame = 0;  // absolute index of row 0
   std::int32_t frame_count = 0;
-  boost::shared_ptr<TrackCells> features;
+  boost::shared_ptr<TrackCells> features;  // empty where the cells are packed
+  boost::shared_ptr<const PackedCells> packed;
 
   AllFeatures();  // the empty table, with an empty vector of its own
+
+  // Copies a row's feature_count cells, however they are kept.
+  void ReadRow(std::size_t row, tracking_feature<float>* cells) const;
 };
+
+// All cells of a table, which are its own where they are not packed.
+boost::shared_ptr<const TrackCells> CellsOf(const AllFeatures& table);
 
 // One run of a feature through one slot: rows [first, last).
 struct Trajectory {

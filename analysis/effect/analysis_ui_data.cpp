@@ -89,9 +89,14 @@ AnalysisUIData::AnalysisUIData(AnalysisEffect& effect)
     analysis_ = state.result->source_identity;
     if (row >= 0 && row < table.frame_count) {
       frame_ = static_cast<std::int32_t>(row);
-      selected_frame_.cells = {table.features, table.features->data() + row * table.feature_count};
+      const auto slots = static_cast<std::size_t>(table.feature_count);
       selected_frame_.count = table.feature_count;
       selected_frame_.has_next = row + 1 < table.frame_count;
+      selected_frame_.cells.resize(selected_frame_.has_next ? 2 * slots : slots);
+      table.ReadRow(static_cast<std::size_t>(row), selected_frame_.cells.data());
+      if (selected_frame_.has_next) {
+        table.ReadRow(static_cast<std::size_t>(row) + 1, selected_frame_.cells.data() + slots);
+      }
     }
   }
   AnalysisUIData::RefreshPoints();
@@ -111,7 +116,7 @@ bool AnalysisUIData::EqualsWithUpdate(const AnalysisUIData& other) {
 
 void AnalysisUIData::RefreshPoints() {
   const auto points = boost::make_shared<ScreenPoints>();
-  const Cell* const cells = selected_frame_.cells.get();
+  const Cell* const cells = selected_frame_.cells.data();
   for (std::int32_t slot = 0; slot < selected_frame_.count; ++slot) {
     const Cell& cell = cells[slot];
     if (cell.status < 0 || !std::isfinite(cell.x) || !std::isfinite(cell.y)) continue;

@@ -55,7 +55,7 @@ class AnalysisUIData {
 
   // The cells of the frame, and whether those of the next one stand behind them.
   struct SelectedFrame {
-    boost::shared_ptr<const Cell> cells;  // keeps the table
+    std::vector<Cell> cells;
     std::int32_t count = 0;
     bool has_next = false;
   };

@@ -3,16 +3,18 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
+#include <utility>
+#include <vector>
 
 namespace calmframe::report {
 namespace {
 
-// Where a row's warp takes a place of the frame. Between the grid's vertices by both sides'
+// Where a warp takes a place of the frame. Between the grid's vertices by both sides'
 // proportion, which a cell of some 30 pixels leaves right to a fraction of a pixel.
-Point Warped(const host::SolvedClip& clip, std::size_t row, Point place) {
-  const auto cell = [](double at, int size, int vertices, int* index) {
-    const double in_cells = std::clamp(at / std::max(size - 1, 1), 0.0, 1.0) * (vertices - 1);
-    *index = std::min(static_cast<int>(in_cells), vertices - 2);
+Point Warped(const host::SolvedClip& clip, const std::vector<Point>& vertices, Point place) {
+  const auto cell = [](double at, int size, int count, int* index) {
+    const double in_cells = std::clamp(at / std::max(size - 1, 1), 0.0, 1.0) * (count - 1);
+    *index = std::min(static_cast<int>(in_cells), count - 2);
     return in_cells - *index;
   };
   int c = 0, r = 0;
@@ -20,9 +22,7 @@ Point Warped(const host::SolvedClip& clip, std::size_t row, Point place) {
   const double down = cell(place.y, clip.height, clip.rows, &r);
   const auto columns = static_cast<std::size_t>(clip.columns);
   const Point* const above =
-      clip.vertices.data() +
-      (row * static_cast<std::size_t>(clip.rows) + static_cast<std::size_t>(r)) * columns +
-      static_cast<std::size_t>(c);
+      vertices.data() + static_cast<std::size_t>(r) * columns + static_cast<std::size_t>(c);
   const Point* const below = above + columns;
   const auto value = [&](double Point::*axis) {
     return std::lerp(std::lerp(above[0].*axis, above[1].*axis, across),
@@ -33,19 +33,19 @@ Point Warped(const host::SolvedClip& clip, std::size_t row, Point place) {
 
 // In how many rows a track is seen, the median over all tracks; 0 without any.
 std::size_t MedianLife(const host::SolvedClip& clip) {
-  const auto slots = static_cast<std::size_t>(clip.slots);
-  std::vector<std::size_t> lives;
-  for (std::size_t slot = 0; slot < slots; ++slot) {
-    std::size_t life = 0;
-    for (std::size_t at = slot; at < clip.statuses.size() + slots; at += slots) {
-      const std::int32_t status = at < clip.statuses.size() ? clip.statuses[at] : -1;
-      if (life > 0 && status != 0) {
-        lives.push_back(life);
-        life = 0;
-      }
-      life += status >= 0;
+  std::vector<std::size_t> lives, open(static_cast<std::size_t>(clip.slots), 0);
+  const auto end = [&lives](std::size_t& life) {
+    if (life > 0) lives.push_back(life);
+    life = 0;
+  };
+  for (std::size_t row = 0; row < static_cast<std::size_t>(clip.frame_count); ++row) {
+    const host::TrackRow tracks = clip.TracksOf(row);
+    for (std::size_t slot = 0; slot < open.size(); ++slot) {
+      if (tracks.statuses[slot] != 0) end(open[slot]);
+      open[slot] += tracks.statuses[slot] >= 0;
     }
   }
+  for (std::size_t& life : open) end(life);
   if (lives.empty()) return 0;
   const auto middle = lives.begin() + static_cast<std::ptrdiff_t>(lives.size() / 2);
   std::nth_element(lives.begin(), middle, lives.end());
@@ -65,21 +65,24 @@ SolveFigures FiguresOf(const host::SolvedClip& clip) {
   const auto rows = static_cast<std::size_t>(clip.frame_count);
   const auto slots = static_cast<std::size_t>(clip.slots);
   std::vector<Point> warped(slots), previous(slots);
-  for (std::size_t row = 0; row < rows; ++row) {
+  host::TrackRow last, tracks = clip.TracksOf(0), next;
+  for (std::size_t row = 0; row < rows;
+       ++row, last = std::exchange(tracks, std::exchange(next, {}))) {
+    const std::vector<Point> vertices = clip.VerticesOf(row);
+    if (row + 1 < rows) next = clip.TracksOf(row + 1);
     int tracked = 0, begun = 0, lost = 0;
     std::vector<Match> before, after;
     for (std::size_t slot = 0; slot < slots; ++slot) {
-      const std::size_t cell = row * slots + slot;
-      if (clip.statuses[cell] < 0) continue;
-      const bool begins = clip.statuses[cell] > 0;
+      if (tracks.statuses[slot] < 0) continue;
+      const bool begins = tracks.statuses[slot] > 0;
       ++tracked;
       begun += begins;
-      lost += row + 1 < rows && clip.statuses[cell + slots] != 0;
-      const Point place{clip.tracks[cell].x * stretch, clip.tracks[cell].y};
-      warped[slot] = Warped(clip, row, place);
-      if (row == 0 || begins || clip.statuses[cell - slots] < 0) continue;
-      const Point& last = clip.tracks[cell - slots];
-      before.push_back({{last.x * stretch, last.y}, place});
+      lost += row + 1 < rows && next.statuses[slot] != 0;
+      const Point place{tracks.places[slot].x * stretch, tracks.places[slot].y};
+      warped[slot] = Warped(clip, vertices, place);
+      if (row == 0 || begins || last.statuses[slot] < 0) continue;
+      const Point& was = last.places[slot];
+      before.push_back({{was.x * stretch, was.y}, place});
       after.push_back({previous[slot], warped[slot]});
     }
     figures.tracked.push_back(tracked);

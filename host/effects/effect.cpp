@@ -178,13 +178,13 @@ CommandResult Effect::Save(SavedEffect* saved) {
   try {
     now.match_name = host_.library().properties().match_name;
     now.values = shared_->params().Values();
-    if (flattened_) now.instance = host_.handles().BytesOf(flattened_);
+    if (flattened_ && saved) now.instance = host_.handles().BytesOf(flattened_);
   } catch (const std::bad_alloc&) {
     if (flattened_) Restore();
     return {HX_ERR_MEMORY, {}};
   }
   if (flattened_) result = Restore();
-  *saved = std::move(now);
+  if (saved) *saved = std::move(now);
   return result;
 }
 

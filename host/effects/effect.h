@@ -59,7 +59,8 @@ class Effect {
   void SetPlayhead(std::int64_t frame) { playhead_ = frame; }
   std::vector<std::string> TakeMessages() { return shared_->TakeMessages(); }
 
-  // The effect lives on. Fails with the plug-in's code; then `saved` stands unchanged.
+  // The effect lives on, as it would come back from a project. Fails with the plug-in's code; then
+  // `saved` stands unchanged. Null: nobody wants the bytes.
   CommandResult Save(SavedEffect* saved);
 
   // Any thread, while the effect stands on its layer.

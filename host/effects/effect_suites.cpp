@@ -213,7 +213,7 @@ HX_Err MayStart(HX_EffectRef, std::uint8_t* may) {
 }
 HX_Err GetCompressionPreference(std::uint8_t* raw) {
   return WithHost("Analysis Host.GetCompressionPreference", [&](Host& host) -> HX_Err {
-    *raw = host.keeps_analysis_raw() ? 1 : 0;
+    *raw = static_cast<std::uint8_t>(host.saves_as());
     return HX_ERR_NONE;
   });
 }

@@ -103,7 +103,7 @@ Host::Host(const std::string& library, const HostSettings& settings)
 
 Host::Host(PluginLibrary library, const HostSettings& settings)
     : settings_(settings),
-      keeps_analysis_raw_(settings.keeps_analysis_raw),
+      saves_as_(settings.saves_as),
       experimental_(settings.experimental_parameters),
       media_(settings.media),
       declarations_(1) {

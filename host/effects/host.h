@@ -12,6 +12,7 @@
 #include "host/effects/instance.h"
 #include "host/effects/lent.h"
 #include "host/effects/loop_wake.h"
+#include "host/effects/payload_form.h"
 #include "host/effects/user_interface.h"
 #include "host/plugin/plugin_library.h"
 #include "host/timeline/media_services.h"
@@ -20,8 +21,8 @@ namespace calmframe::host {
 
 struct HostSettings {
   MediaSettings media;
-  std::string project_path;         // UTF-8; empty is legal
-  bool keeps_analysis_raw = false;  // at first; see Host::KeepAnalysisRaw
+  std::string project_path;                      // UTF-8; empty is legal
+  PayloadForm saves_as = PayloadForm::deflated;  // at first; see Host::SaveAs
   // Plug-ins declare their parameters for experts, too; the first host that loads one settles it
   // for as long as the process keeps the library. The solve's log, which comes with the option, is
   // shown where the environment asks for it.
@@ -64,9 +65,9 @@ class Host {
   CommandResult About();
 
   const HostSettings& settings() const { return settings_; }
-  // Whether plug-ins are asked not to compress what they save. Any thread.
-  void KeepAnalysisRaw(bool raw) { keeps_analysis_raw_ = raw; }
-  bool keeps_analysis_raw() const { return keeps_analysis_raw_; }
+  // What plug-ins are asked to save for. Any thread.
+  void SaveAs(PayloadForm form) { saves_as_ = form; }
+  PayloadForm saves_as() const { return saves_as_; }
   MediaServices& media() { return media_; }
   UserInterface& user_interface() { return user_interface_; }
   // The process's, for all its hosts; they begin anew with the first one.
@@ -119,7 +120,7 @@ class Host {
   };
 
   const HostSettings settings_;
-  std::atomic<bool> keeps_analysis_raw_;
+  std::atomic<PayloadForm> saves_as_;
   const ExperimentalParameters experimental_;
   std::list<PluginLibrary> library_;  // one; it goes on to others without memory
   const SharedByAll<Lent> lent_;

@@ -189,24 +189,16 @@ Chooser::Chooser(const MovingClip& clip, const FollowSettings& settings,
                  const ChoiceWeights& weights)
     : settings_(settings),
       weights_(weights),
-      source_(clip.motion(Warps::none)),
-      as_filmed_(MotionOfSource(clip.clip(), *source_)) {
+      source_(MeasureSource(MotionOfSource(clip.clip(), *clip.motion(Warps::none)),
+                            settings.frames_per_second)),
+      whole_frames_(WholeFrames(clip.clip())) {
   choice_.most_zoom = settings.most_zoom;
   choice_.zoom_speed = settings.zoom_speed;
 }
 
-std::vector<Similarity> Chooser::WindowsOf(const Candidate& candidate, const WarpedPlane& plane,
-                                           const PictureMotion& motion) const {
-  if (!candidate.follows) return WholeFrames(plane.clip());
-  FollowSettings settings = settings_;
-  settings.weights.width = candidate.width_weight;
-  return FollowWindows(plane, motion, settings);
-}
-
 bool Chooser::Consider(Candidate candidate, const MovingClip& solved, bool by_best_width) {
   const WarpedPlane plane(solved.clip(), candidate.warps);
-  const PictureMotion& motion =
-      candidate.warps == Warps::none ? *source_ : *solved.motion(candidate.warps);
+  const PictureMotion& motion = *solved.motion(candidate.warps);
   std::vector<Candidate> tries;
   if (by_best_width) {
     candidate.width_weight = choice_.best().width_weight;
@@ -218,13 +210,14 @@ bool Chooser::Consider(Candidate candidate, const MovingClip& solved, bool by_be
     tries.push_back(candidate);
   }
   std::vector<std::vector<Similarity>> windows(tries.size());
+  const WindowFinder finder(plane, motion, settings_);
+  tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+      [&](std::size_t i) { windows[i] = finder.Find(tries[i].width_weight); }, tries.size());
+  const std::vector<ShownMotion> shown = MotionsShown(plane, motion, windows, finder.filled());
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
       [&](std::size_t i) {
         Candidate& at = tries[i];
-        windows[i] = WindowsOf(at, plane, motion);
-        at.outcome =
-            MeasureOutcome(as_filmed_, MotionShown(plane, motion, windows[i], settings_.filling),
-                           settings_.frames_per_second);
+        at.outcome = MeasureOutcome(source_, shown[i], settings_.frames_per_second);
         at.outcome.window = Outcome::Window::follow;
         at.outcome.bends = at.warps == Warps::solved;
         at.cost = CostOf(at);
@@ -244,10 +237,9 @@ bool Chooser::Consider(Candidate candidate, const MovingClip& solved, bool by_be
   return true;
 }
 
-void Chooser::ConsiderAsFilmed(const SolvedClip& clip) {
+void Chooser::ConsiderAsFilmed() {
   Candidate filmed{.name = "as filmed", .warps = Warps::none, .follows = false};
-  std::vector<Similarity> windows = WholeFrames(clip);
-  filmed.outcome = MeasureOutcome(as_filmed_, as_filmed_, settings_.frames_per_second);
+  filmed.outcome = source_;
   filmed.outcome.window = Outcome::Window::none;
   filmed.outcome.bends = false;
   filmed.cost = CostOf(filmed);
@@ -257,13 +249,17 @@ void Chooser::ConsiderAsFilmed(const SolvedClip& clip) {
   choice_.candidates.push_back(std::move(filmed));
   if (!is_best) return;
   choice_.taken = choice_.candidates.size() - 1;
-  windows_ = std::move(windows);
+  windows_ = whole_frames_;
 }
 
 void Chooser::Take(const Choice& choice, const MovingClip& solved) {
   choice_ = choice;
   const WarpedPlane plane(solved.clip(), choice_.best().warps);
-  windows_ = WindowsOf(choice_.best(), plane, *solved.motion(choice_.best().warps));
+  const Candidate& best = choice_.best();
+  windows_ =
+      best.follows
+          ? WindowFinder(plane, *solved.motion(best.warps), settings_).Find(best.width_weight)
+          : whole_frames_;
 }
 
 bool Chooser::leaves_shake() const {

@@ -95,7 +95,7 @@ class Chooser {
   bool Consider(Candidate candidate, const MovingClip& solved, bool by_best_width = false);
   // After all others: the clip as it was filmed, which is taken where none of them is calmer, or
   // all leave black. What it has ahead of them, its width, counts for nothing.
-  void ConsiderAsFilmed(const SolvedClip& clip);
+  void ConsiderAsFilmed();
   // The windows of a candidate that was chosen before, with its solve.
   void Take(const Choice& choice, const MovingClip& solved);
 
@@ -106,16 +106,14 @@ class Chooser {
   bool leaves_shake() const;
 
  private:
-  std::vector<Similarity> WindowsOf(const Candidate& candidate, const WarpedPlane& plane,
-                                    const PictureMotion& motion) const;
   // Shake and flicker, in decibels.
   double UnrestOf(const Outcome& outcome) const;
   double CostOf(const Candidate& candidate) const;
 
   const FollowSettings settings_;
   const ChoiceWeights weights_;
-  const MovingClip::MotionPtr source_;
-  const ShownMotion as_filmed_;
+  const Outcome source_;
+  const std::vector<Similarity> whole_frames_;
   Choice choice_;
   std::vector<Similarity> windows_;
 };

@@ -4,6 +4,7 @@
 #include <array>
 #include <cmath>
 #include <cstdlib>
+#include <utility>
 
 #include "host/stabilize/seams.h"
 #include "host/stabilize/window/clip_windows.h"
@@ -89,34 +90,38 @@ FilledPlane::FilledPlane(const WarpedPlane& plane, const Filling& filling)
   const auto add = [](Regions& to, std::vector<HalfPlane> region) {
     if (!region.empty()) to.push_back(std::move(region));
   };
-  for (std::size_t f = 0; f < covered_.size(); ++f) {
-    add(covered_[f], CoveredRegion(plane.Warp(f), filling.rim));
-  }
-  fits_ = covered_;
+  fits_.resize(covered_.size());
   std::vector<SolvedClip::Neighbour> neighbours = NeighboursIn(plane.clip(), plane.warps());
-  const auto away = [](const auto& neighbour) { return std::abs(neighbour.frame - neighbour.in); };
-  std::stable_sort(neighbours.begin(), neighbours.end(),
-                   [&](const auto& a, const auto& b) { return away(a) < away(b); });
-  const Seams seams(plane);
-  struct Torn {
-    std::array<bool, 4> before{}, after{};
+  std::erase_if(neighbours, [&filling](const SolvedClip::Neighbour& neighbour) {
+    return std::abs(neighbour.frame - neighbour.in) > filling.reach;
+  });
+  const auto order = [](const SolvedClip::Neighbour& neighbour) {
+    return std::pair(neighbour.in, std::abs(neighbour.frame - neighbour.in));
   };
-  std::vector<Torn> torn(covered_.size());
-  for (const SolvedClip::Neighbour& neighbour : neighbours) {
-    if (away(neighbour) > filling.reach) continue;
-    const auto in = static_cast<std::size_t>(neighbour.in);
-    std::vector<HalfPlane> region = RegionOf(neighbour, width_, height_, filling.rim);
-    add(covered_[in], region);
-    const std::vector<HalfPlane> own = CoveredRegion(plane.Warp(in), filling.rim);
-    if (region.empty() || own.empty()) continue;
-    // What lies behind one that is torn, further away, is hardly seen.
-    auto& of_side = neighbour.frame < neighbour.in ? torn[in].before : torn[in].after;
-    const std::array<bool, 4> by_this = seams.TornBy(neighbour);
-    for (std::size_t side = 0; side < own.size(); ++side) {
-      of_side[side] = of_side[side] || by_this[side];
-      if (of_side[side]) region.push_back(own[side]);
+  std::stable_sort(neighbours.begin(), neighbours.end(),
+                   [&](const auto& a, const auto& b) { return order(a) < order(b); });
+  Seams seams(plane);
+  auto neighbour = neighbours.begin();
+  for (std::size_t f = 0; f < covered_.size(); ++f) {
+    const PlaneFrame frame = plane.Frame(f);
+    const std::vector<HalfPlane> own = CoveredRegion(frame.Warp(), filling.rim);
+    add(covered_[f], own);
+    add(fits_[f], own);
+    std::array<bool, 4> torn_before{}, torn_after{};
+    for (; neighbour != neighbours.end() && static_cast<std::size_t>(neighbour->in) == f;
+         ++neighbour) {
+      std::vector<HalfPlane> region = RegionOf(*neighbour, width_, height_, filling.rim);
+      add(covered_[f], region);
+      if (region.empty() || own.empty()) continue;
+      // What lies behind one that is torn, further away, is hardly seen.
+      auto& of_side = neighbour->frame < neighbour->in ? torn_before : torn_after;
+      const std::array<bool, 4> by_this = seams.TornBy(*neighbour, frame, filling.reach);
+      for (std::size_t side = 0; side < own.size(); ++side) {
+        of_side[side] = of_side[side] || by_this[side];
+        if (of_side[side]) region.push_back(own[side]);
+      }
+      add(fits_[f], std::move(region));
     }
-    add(fits_[in], std::move(region));
   }
 }
 

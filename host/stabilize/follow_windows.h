@@ -29,7 +29,23 @@ struct FollowSettings {
 // FindWindowPath. A frame whose warp is folded counts as one that fills the plane's corner. Where
 // the edges are filled, the windows stay where the picture is once they are: from those that stay
 // in the frames on, each round finds the calmest in the parts of the plane that are covered around
-// those before.
+// those before. Refers to nothing once it is made. Any thread.
+class WindowFinder {
+ public:
+  WindowFinder(const WarpedPlane& plane, const PictureMotion& motion,
+               const FollowSettings& settings);
+
+  // With that weight in the place of the settings'.
+  std::vector<Similarity> Find(double width_weight) const;
+  const FilledPlane* filled() const { return filled_ ? &*filled_ : nullptr; }
+
+ private:
+  const FollowSettings settings_;
+  const int width_, height_;
+  const Point middle_;
+  std::vector<WindowFrame> frames_;
+  std::optional<FilledPlane> filled_;
+};
 std::vector<Similarity> FollowWindows(const WarpedPlane& plane, const PictureMotion& motion,
                                       const FollowSettings& settings);
 
@@ -41,7 +57,11 @@ std::vector<Similarity> OwnWindows(const SolvedClip& clip, double zoom);
 // there what is drawn rounds to the frame or beside it.
 std::vector<Similarity> WholeFrames(const SolvedClip& clip);
 
-// What these windows show, with the edges filled or not. `motion`: that of the plane.
+// What each of several ways to show a clip by windows shows; they share the paths. `motion`: that
+// of the plane. `filled`: what covers it where the edges are filled; else null.
+std::vector<ShownMotion> MotionsShown(const WarpedPlane& plane, const PictureMotion& motion,
+                                      const std::vector<std::vector<Similarity>>& ways,
+                                      const FilledPlane* filled);
 ShownMotion MotionShown(const WarpedPlane& plane, const PictureMotion& motion,
                         const std::vector<Similarity>& windows,
                         const std::optional<Filling>& filling = {});

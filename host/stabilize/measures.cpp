@@ -137,23 +137,43 @@ double MeasureTrackShake(const ShownMotion& shown, double frames_per_second) {
   const auto reach =
       static_cast<std::size_t>(ReachOf(static_cast<std::ptrdiff_t>(frames), frames_per_second));
   const std::vector<double> weights = ParabolaWeights(static_cast<std::ptrdiff_t>(reach));
-  std::vector<std::vector<double>> of_frames(frames);
-  for (const TrackPath& path : shown.paths) {
-    for (std::size_t middle = reach; middle + reach < path.points.size(); ++middle) {
-      Point off = path.points[middle];
-      for (std::size_t i = 0; i < weights.size(); ++i) {
-        off.x -= weights[i] * path.points[middle - reach + i].x;
-        off.y -= weights[i] * path.points[middle - reach + i].y;
-      }
-      of_frames[path.first + middle].push_back(std::hypot(off.x, off.y) * 1000 / shown.width);
-    }
-  }
+  if (!shown.paths) return 0;
   double sum = 0;
   int count = 0;
-  for (std::vector<double>& shakes : of_frames) {
-    if (shakes.size() < 3) continue;
-    sum += Median(shakes);
-    ++count;
+  // A stretch of frames after the other, so that no more than its shakes are there at a time.
+  constexpr std::size_t kStretch = 4096;
+  std::vector<Point> points;
+  for (std::size_t first = 0; first < frames; first += kStretch) {
+    const std::size_t end = std::min(frames, first + kStretch);
+    std::vector<std::vector<double>> of_frames(end - first);
+    for (const TrackPath& path : *shown.paths) {
+      // The frames of the path that are both in the stretch and far enough from its ends.
+      const std::size_t begin = std::max(path.first + reach, first);
+      const std::size_t length = path.points.size();
+      const std::size_t stop = std::min(path.first + length - std::min(reach, length), end);
+      if (begin >= stop) continue;
+      const std::size_t behind = begin - reach - path.first;
+      points.assign(path.points.begin() + static_cast<std::ptrdiff_t>(behind),
+                    path.points.begin() + static_cast<std::ptrdiff_t>(stop - path.first + reach));
+      if (!shown.to_output.empty()) {
+        for (std::size_t i = 0; i < points.size(); ++i) {
+          points[i] = shown.to_output[begin - reach + i](points[i]);
+        }
+      }
+      for (std::size_t frame = begin; frame < stop; ++frame) {
+        Point off = points[frame - begin + reach];
+        for (std::size_t i = 0; i < weights.size(); ++i) {
+          off.x -= weights[i] * points[frame - begin + i].x;
+          off.y -= weights[i] * points[frame - begin + i].y;
+        }
+        of_frames[frame - first].push_back(std::hypot(off.x, off.y) * 1000 / shown.width);
+      }
+    }
+    for (std::vector<double>& shakes : of_frames) {
+      if (shakes.size() < 3) continue;
+      sum += Median(shakes);
+      ++count;
+    }
   }
   return count == 0 ? 0 : sum / count;
 }

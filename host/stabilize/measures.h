@@ -1,8 +1,10 @@
 #pragma once
 
+#include <memory>
 #include <vector>
 
 #include "host/stabilize/picture_motion.h"
+#include "host/stabilize/track_paths.h"
 
 namespace calmframe::host {
 
@@ -15,10 +17,12 @@ struct ShownMotion {
   std::vector<double> zooms;      // how many times enlarged each frame shows the source
   std::vector<double> uncovered;  // share of each frame where the source shows nothing, 0 to 1
   std::vector<double> wobble;     // pixels of the output; see PictureMotion
-  std::vector<TrackPath> paths;   // of the tracks in the output
+  std::shared_ptr<const std::vector<TrackPath>> paths;  // of the tracks; null: none
   // What each frame shows in its middle: square pixels of the source about the frame's own middle,
   // where the camera was pointed. No number where the frame's warp is folded.
   std::vector<Point> aims;
+  // What takes a frame's points of the paths to the output; empty: they are in it.
+  std::vector<Similarity> to_output = {};
 };
 
 // Motion that is faster than about 0.9 Hz, in pixels of a picture 1000 wide: how far the path of

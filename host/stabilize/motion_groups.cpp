@@ -4,9 +4,12 @@
 #include <array>
 #include <cmath>
 #include <cstddef>
+#include <cstdint>
+#include <limits>
 #include <optional>
 #include <span>
 #include <utility>
+#include <vector>
 
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
@@ -41,65 +44,99 @@ struct Step {
 class Tracks {
  public:
   explicit Tracks(const SolvedClip& clip)
-      : aspect_(clip.width / static_cast<double>(clip.source_width)),
+      : clip_(clip),
+        aspect_(clip.width / static_cast<double>(clip.source_width)),
         width_(clip.width),
         height_(clip.height),
-        cells_(static_cast<std::size_t>(clip.frame_count)) {
-    const auto slots = static_cast<std::size_t>(clip.slots);
-    std::vector<std::optional<std::size_t>> of_slot(slots);
-    for (std::size_t row = 0; row < cells_.size(); ++row) {
-      pairs_.push_back(steps_.size());
-      for (std::size_t slot = 0; slot < slots; ++slot) {
-        const std::size_t cell = row * slots + slot;
-        const std::int32_t status = clip.statuses[cell];
-        const bool begins = status > 0 || status == kDeletedBegins;
-        if (begins) {
-          of_slot[slot] = begun_.size();
+        pairs_(static_cast<std::size_t>(clip.frame_count)) {
+    std::vector<KeptStep> steps;
+    TrackRow before;
+    Walk([&](std::size_t row, const TrackRow& tracks, const std::vector<std::size_t>& of_slot) {
+      steps.clear();
+      for (std::size_t slot = 0; slot < of_slot.size(); ++slot) {
+        if (of_slot[slot] == kNone) continue;
+        if (Begins(tracks.statuses[slot])) {
           begun_.push_back({static_cast<int>(row), static_cast<int>(slot)});
-        } else if (status != 0 && status != kDeletedGoesOn) {
-          of_slot[slot].reset();
+          continue;
         }
-        if (!of_slot[slot]) continue;
-        const Point at = InWidths(clip.tracks[cell]);
-        cells_[row].push_back({*of_slot[slot], at});
-        if (begins) continue;
-        const Point before = InWidths(clip.tracks[cell - slots]);
-        if (!IsNear(at) || !IsNear(before)) continue;
-        steps_.push_back({*of_slot[slot], at, {before.x - at.x, before.y - at.y}});
+        const Point &at = tracks.places[slot], &was = before.places[slot];
+        if (!IsNear(InWidths(at)) || !IsNear(InWidths(was))) continue;
+        steps.push_back({static_cast<std::uint32_t>(of_slot[slot]), static_cast<float>(at.x),
+                         static_cast<float>(at.y), static_cast<float>(was.x),
+                         static_cast<float>(was.y)});
       }
-    }
-    pairs_.push_back(steps_.size());
+      pairs_[row] = steps;
+      before = tracks;
+    });
   }
-
-  struct Cell {
-    std::size_t track;
-    Point at;
-  };
 
   std::size_t count() const { return begun_.size(); }
   const std::vector<GroupedTrack>& begun() const { return begun_; }
-  const std::vector<std::vector<Cell>>& cells() const { return cells_; }  // by row
-  std::size_t pairs() const { return pairs_.size() - 1; }
-  const std::vector<Step>& steps() const { return steps_; }
-  std::size_t first(std::size_t pair) const { return pairs_[pair]; }
+  std::size_t pairs() const { return pairs_.size(); }
+  std::size_t StepsIn(std::size_t pair) const { return pairs_[pair].size(); }
+  std::size_t TrackOf(std::size_t pair, std::size_t step) const { return pairs_[pair][step].track; }
   // From a row to the one before; none of the first row.
-  std::span<const Step> Pair(std::size_t pair) const {
-    return {steps_.data() + pairs_[pair], pairs_[pair + 1] - pairs_[pair]};
+  std::vector<Step> Pair(std::size_t pair) const {
+    std::vector<Step> steps;
+    steps.reserve(pairs_[pair].size());
+    for (const KeptStep& kept : pairs_[pair]) {
+      const Point at = InWidths({kept.x, kept.y}),
+                  before = InWidths({kept.before_x, kept.before_y});
+      steps.push_back({kept.track, at, {before.x - at.x, before.y - at.y}});
+    }
+    return steps;
+  }
+  // visit(track, place) for all of a row's, and then end_of_row().
+  template <class Visit, class End>
+  void ForEachCell(const Visit& visit, const End& end_of_row) const {
+    Walk([&](std::size_t, const TrackRow& tracks, const std::vector<std::size_t>& of_slot) {
+      for (std::size_t slot = 0; slot < of_slot.size(); ++slot) {
+        if (of_slot[slot] != kNone) visit(of_slot[slot], InWidths(tracks.places[slot]));
+      }
+      end_of_row();
+    });
   }
   double half_height() const { return height_ / width_ / 2; }
 
  private:
+  static constexpr std::size_t kNone = std::numeric_limits<std::size_t>::max();
+  // In the source's own pixels, of which tracks lie on 32nds: floats hold them.
+  struct KeptStep {
+    std::uint32_t track;
+    float x, y, before_x, before_y;
+  };
+
+  static bool Begins(std::int32_t status) { return status > 0 || status == kDeletedBegins; }
+
+  // visit(row, its tracks, which track is in each slot)
+  template <class Visit>
+  void Walk(const Visit& visit) const {
+    std::size_t begun = 0;
+    std::vector<std::size_t> of_slot(static_cast<std::size_t>(clip_.slots), kNone);
+    for (std::size_t row = 0; row < pairs_.size(); ++row) {
+      const TrackRow tracks = clip_.TracksOf(row);
+      for (std::size_t slot = 0; slot < of_slot.size(); ++slot) {
+        const std::int32_t status = tracks.statuses[slot];
+        if (Begins(status)) {
+          of_slot[slot] = begun++;
+        } else if (status != 0 && status != kDeletedGoesOn) {
+          of_slot[slot] = kNone;
+        }
+      }
+      visit(row, tracks, of_slot);
+    }
+  }
+
   Point InWidths(const Point& p) const {
     return {((p.x + 0.5) * aspect_ - width_ / 2) / width_, (p.y + 0.5 - height_ / 2) / width_};
   }
   // From a file they may lie anywhere.
   static bool IsNear(const Point& p) { return std::abs(p.x) < 2 && std::abs(p.y) < 2; }
 
+  const SolvedClip& clip_;
   double aspect_, width_, height_;
   std::vector<GroupedTrack> begun_;
-  std::vector<std::vector<Cell>> cells_;
-  std::vector<Step> steps_;
-  std::vector<std::size_t> pairs_;  // where each begins in steps_, and their end
+  std::vector<std::vector<KeptStep>> pairs_;
 };
 
 // -- Motions --
@@ -285,33 +322,31 @@ std::vector<std::optional<Ellipse>> FindSubject(const Tracks& tracks,
 class Mixture {
  public:
   explicit Mixture(const Tracks& tracks)
-      : tracks_(tracks),
-        leans_(tracks.count()),
-        votes_(tracks.steps().size()),
-        misses_(tracks.steps().size()) {}
+      : tracks_(tracks), leans_(tracks.count()), misses_(tracks.pairs()) {}
 
   // By track, from -1 to 1; see kSure.
   const std::vector<double>& leans() const { return leans_; }
   struct Misses {
     double first, second;
   };
-  // Of a step, from the background and from the subject; kMostMiss at most.
-  const std::vector<Misses>& misses() const { return misses_; }
+  // Of a pair's steps in the last round, from the background and from the subject; kMostMiss at
+  // most. None of a pair with too few.
+  const std::vector<Misses>& misses(std::size_t pair) const { return misses_[pair]; }
 
   // From the motion that most tracks of a pair follow, and that most of the rest do. Which of both
   // is which in the next pair, the tracks tell that go on.
   void Begin() {
-    ForEachPair([this](std::size_t pair) { VoteForDominant(pair); });
     std::vector<double> sums(leans_.size());
-    for (std::size_t pair = 0; pair < tracks_.pairs(); ++pair) {
-      const std::span<const Step> steps = tracks_.Pair(pair);
-      const double* const votes = votes_.data() + tracks_.first(pair);
-      double agreement = 0;
-      for (std::size_t i = 0; i < steps.size(); ++i) agreement += sums[steps[i].track] * votes[i];
-      for (std::size_t i = 0; i < steps.size(); ++i) {
-        sums[steps[i].track] += agreement < 0 ? -votes[i] : votes[i];
-      }
-    }
+    ForEachPair([this](std::size_t pair, Votes& votes) { VoteForDominant(pair, votes); },
+                [&](std::size_t pair, const Votes& votes) {
+                  double agreement = 0;
+                  for (std::size_t i = 0; i < votes.size(); ++i) {
+                    agreement += sums[tracks_.TrackOf(pair, i)] * votes[i];
+                  }
+                  for (std::size_t i = 0; i < votes.size(); ++i) {
+                    sums[tracks_.TrackOf(pair, i)] += agreement < 0 ? -votes[i] : votes[i];
+                  }
+                });
     Lean(sums);
   }
 
@@ -320,37 +355,53 @@ class Mixture {
   }
 
   // Both motions by the tracks that lean to them, then these by how they follow the motions.
-  void Round(bool knows_background) {
+  // The last one keeps the misses.
+  void Round(bool knows_background, bool is_last = false) {
     std::vector<std::optional<Ellipse>> subject(tracks_.pairs());
     if (knows_background) subject = FindSubject(tracks_, leans_);
-    ForEachPair([&](std::size_t pair) {
-      if (knows_background) {
-        FitPair<kQuadratic>(pair, subject[pair]);
-      } else {
-        FitPair<kAffine>(pair, subject[pair]);
-      }
-    });
+    keeps_misses_ = is_last;
     std::vector<double> sums(leans_.size());
-    for (std::size_t i = 0; i < votes_.size(); ++i) sums[tracks_.steps()[i].track] += votes_[i];
+    ForEachPair(
+        [&](std::size_t pair, Votes& votes) {
+          if (knows_background) {
+            FitPair<kQuadratic>(pair, subject[pair], votes);
+          } else {
+            FitPair<kAffine>(pair, subject[pair], votes);
+          }
+        },
+        [&](std::size_t pair, const Votes& votes) {
+          for (std::size_t i = 0; i < votes.size(); ++i) sums[tracks_.TrackOf(pair, i)] += votes[i];
+        });
     Lean(sums);
   }
 
  private:
-  template <class Task>
-  void ForEachPair(const Task& task) {
-    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
-        [&](std::size_t pair) {
-          if (tracks_.Pair(pair).size() >= kFewest) task(pair);
-        },
-        tracks_.pairs());
+  using Votes = std::vector<double>;  // of a pair's steps
+
+  // vote(pair, votes), which are 0, for the pairs that have enough steps, on all processors; then
+  // take(pair, votes), pair by pair. A stretch of pairs after the other, so that no more than its
+  // votes are there at a time.
+  template <class Vote, class Take>
+  void ForEachPair(const Vote& vote, const Take& take) {
+    constexpr std::size_t kStretch = 256;
+    for (std::size_t first = 0; first < tracks_.pairs(); first += kStretch) {
+      std::vector<Votes> votes(std::min(kStretch, tracks_.pairs() - first));
+      tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+          [&](std::size_t i) {
+            votes[i].resize(tracks_.StepsIn(first + i));
+            if (votes[i].size() >= kFewest) vote(first + i, votes[i]);
+          },
+          votes.size());
+      for (std::size_t i = 0; i < votes.size(); ++i) take(first + i, votes[i]);
+    }
   }
 
   void Lean(const std::vector<double>& sums) {
     for (std::size_t i = 0; i < sums.size(); ++i) leans_[i] = std::tanh(sums[i]);
   }
 
-  void VoteForDominant(std::size_t pair) {
-    const std::span<const Step> steps = tracks_.Pair(pair);
+  void VoteForDominant(std::size_t pair, Votes& votes) {
+    const std::vector<Step> steps = tracks_.Pair(pair);
     std::vector<Point> from, to;
     std::vector<double> misses(steps.size(), 2 * kMostMiss);
     // By how much less a track misses the new motion.
@@ -360,8 +411,7 @@ class Mixture {
         const auto& [track, at, move] = steps[i];
         const Point reached = motion(at);
         const double miss = MissOf({reached.x - at.x - move.x, reached.y - at.y - move.y});
-        votes_[tracks_.first(pair) + i] =
-            std::clamp(std::min(miss, 2.0) - std::min(misses[i], 2.0), -1.0, 1.0);
+        votes[i] = std::clamp(std::min(miss, 2.0) - std::min(misses[i], 2.0), -1.0, 1.0);
         misses[i] = miss;
       }
     };
@@ -381,15 +431,15 @@ class Mixture {
     if (from.size() >= 3) {
       fit();
     } else {
-      for (std::size_t i = 0; i < steps.size(); ++i) votes_[tracks_.first(pair) + i] = 0;
+      std::fill(votes.begin(), votes.end(), 0.0);
     }
   }
 
   template <std::size_t kBackgroundTerms>
-  void FitPair(std::size_t pair, const std::optional<Ellipse>& subject) {
+  void FitPair(std::size_t pair, const std::optional<Ellipse>& subject, Votes& votes) {
     constexpr double kOfOthers = 1e-4;  // weight of tracks that lean to the other motion
-    const std::span<const Step> steps = tracks_.Pair(pair);
-    Misses* const misses = misses_.data() + tracks_.first(pair);
+    const std::vector<Step> steps = tracks_.Pair(pair);
+    std::vector<Misses> misses(steps.size());
     std::vector<double> weights(steps.size()), own(steps.size());
     const auto fit = [&](auto flow, double side, double Misses::*miss) {
       for (std::size_t i = 0; i < steps.size(); ++i) {
@@ -410,11 +460,11 @@ class Mixture {
     };
     fit(Flow<kBackgroundTerms>(), 1, &Misses::first);
     fit(Flow<kAffine>(), -1, &Misses::second);
-    double* const votes = votes_.data() + tracks_.first(pair);
     for (std::size_t i = 0; i < steps.size(); ++i) {
       votes[i] = misses[i].second - misses[i].first;
       if (subject) votes[i] += VoteOfPlace(*subject, steps[i].at);
     }
+    if (keeps_misses_) misses_[pair] = std::move(misses);
   }
 
   // What moves with the subject and lies far from it is behind it all the same.
@@ -425,8 +475,8 @@ class Mixture {
 
   const Tracks& tracks_;
   std::vector<double> leans_;
-  std::vector<double> votes_;  // of a step: for the background above 0, for the subject below
-  std::vector<Misses> misses_;
+  bool keeps_misses_ = false;
+  std::vector<std::vector<Misses>> misses_;  // by pair
 };
 
 // -- What came of it --
@@ -477,15 +527,16 @@ template <class GroupOf>
 std::pair<Reach, Reach> ReachOfGroups(const Tracks& tracks, const GroupOf& group_of) {
   Reach background, subject;
   ReachCounter of_background(tracks.half_height()), of_subject(tracks.half_height());
-  for (const std::vector<Tracks::Cell>& row : tracks.cells()) {
-    for (const Tracks::Cell& cell : row) {
-      const MotionGroup group = group_of(cell.track);
-      if (group == MotionGroup::background) of_background.Add(cell.at);
-      if (group == MotionGroup::subject) of_subject.Add(cell.at);
-    }
-    of_background.Take(background);
-    of_subject.Take(subject);
-  }
+  tracks.ForEachCell(
+      [&](std::size_t track, const Point& at) {
+        const MotionGroup group = group_of(track);
+        if (group == MotionGroup::background) of_background.Add(at);
+        if (group == MotionGroup::subject) of_subject.Add(at);
+      },
+      [&] {
+        of_background.Take(background);
+        of_subject.Take(subject);
+      });
   return {background, subject};
 }
 
@@ -498,16 +549,20 @@ MotionGroup GroupOf(double lean) {
 void Judge(const Tracks& tracks, const Mixture& mixture, MotionGroups& groups) {
   constexpr double kLeastShare = 0.01;  // of the tracks, in frames
   constexpr double kLeastMiss = 0.5;    // of the background
-  double steps = 0, of_background = 0, of_subject = 0;
-  for (std::size_t i = 0; i < tracks.steps().size(); ++i) {
-    if (GroupOf(mixture.leans()[tracks.steps()[i].track]) != MotionGroup::subject) continue;
-    ++steps;
-    of_background += mixture.misses()[i].first;
-    of_subject += mixture.misses()[i].second;
+  double steps = 0, of_background = 0, of_subject = 0, all = 0;
+  for (std::size_t pair = 0; pair < tracks.pairs(); ++pair) {
+    all += static_cast<double>(tracks.StepsIn(pair));
+    for (std::size_t i = 0; i < tracks.StepsIn(pair); ++i) {
+      if (GroupOf(mixture.leans()[tracks.TrackOf(pair, i)]) != MotionGroup::subject) continue;
+      ++steps;
+      if (mixture.misses(pair).empty()) continue;
+      of_background += mixture.misses(pair)[i].first;
+      of_subject += mixture.misses(pair)[i].second;
+    }
   }
   if (steps == 0) return;
-  groups.has_subject = steps >= kLeastShare * static_cast<double>(tracks.steps().size()) &&
-                       of_background >= kLeastMiss * steps && of_background >= 2 * of_subject;
+  groups.has_subject = steps >= kLeastShare * all && of_background >= kLeastMiss * steps &&
+                       of_background >= 2 * of_subject;
   const auto root = [&](double sum) { return std::sqrt(sum / steps) * kTrackTolerance * 1000; };
   groups.miss_of_background = root(of_background);
   groups.miss_of_subject = root(of_subject);
@@ -525,7 +580,7 @@ MotionGroups FindMotionGroups(const SolvedClip& clip) {
       std::pair(second.edges, second.cells) > std::pair(first.edges, first.cells)) {
     mixture.Swap();
   }
-  for (int i = 0; i < kUnequalRounds; ++i) mixture.Round(true);
+  for (int i = 0; i < kUnequalRounds; ++i) mixture.Round(true, i + 1 == kUnequalRounds);
 
   MotionGroups groups;
   groups.tracks = tracks.begun();

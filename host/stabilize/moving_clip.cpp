@@ -1,5 +1,6 @@
 #include "host/stabilize/moving_clip.h"
 
+#include <cstddef>
 #include <utility>
 
 #include "host/stabilize/warped_plane.h"
@@ -7,11 +8,19 @@
 namespace calmframe::host {
 namespace {
 
+template <class Of>
+bool AreSame(const SolvedClip& a, const SolvedClip& b, Of SolvedClip::*of_frame) {
+  for (std::size_t f = 0; f < static_cast<std::size_t>(a.frame_count); ++f) {
+    if ((a.*of_frame)(f) != (b.*of_frame)(f)) return false;
+  }
+  return true;
+}
+
 bool HaveSameTracks(const SolvedClip& a, const SolvedClip& b) {
   return a.source_width == b.source_width && a.source_height == b.source_height &&
          a.width == b.width && a.height == b.height && a.first_frame == b.first_frame &&
          a.frame_count == b.frame_count && a.slots == b.slots && a.columns == b.columns &&
-         a.rows == b.rows && a.statuses == b.statuses && a.tracks == b.tracks;
+         a.rows == b.rows && AreSame(a, b, &SolvedClip::TracksOf);
 }
 
 }  // namespace
@@ -19,7 +28,7 @@ bool HaveSameTracks(const SolvedClip& a, const SolvedClip& b) {
 MovingClip::MovingClip(SolvedClip clip, const MovingClip& other) : clip_(std::move(clip)) {
   if (!HaveSameTracks(clip_, other.clip_)) return;
   none_ = other.none_;
-  if (clip_.vertices == other.clip_.vertices) solved_ = other.solved_;
+  if (AreSame(clip_, other.clip_, &SolvedClip::VerticesOf)) solved_ = other.solved_;
 }
 
 const MovingClip::MotionPtr& MovingClip::motion(Warps warps) const {

@@ -133,13 +133,20 @@ Outcome OutcomeOf(const std::vector<ShotOutcome>& shots) {
   return film;
 }
 
-Outcome MeasureOutcome(const ShownMotion& source, const ShownMotion& shown,
-                       double frames_per_second) {
+Outcome MeasureSource(const ShownMotion& source, double frames_per_second) {
+  Outcome outcome = MeasureOutcome(Outcome(), source, frames_per_second);
+  outcome.before = outcome.after;
+  outcome.wobble_before = outcome.wobble_after;
+  outcome.tracks_before = outcome.tracks_after;
+  return outcome;
+}
+
+Outcome MeasureOutcome(const Outcome& source, const ShownMotion& shown, double frames_per_second) {
   Outcome outcome;
-  outcome.before = MeasureShake(source, frames_per_second);
+  outcome.before = source.before;
   outcome.after = MeasureShake(shown, frames_per_second);
-  outcome.wobble_before = MeasureWobble(source);
-  outcome.tracks_before = MeasureTrackShake(source, frames_per_second);
+  outcome.wobble_before = source.wobble_before;
+  outcome.tracks_before = source.tracks_before;
   outcome.tracks_after = MeasureTrackShake(shown, frames_per_second);
   outcome.wobble_after = MeasureWobble(shown);
   outcome.straying = MeasureStraying(shown, frames_per_second);

@@ -48,8 +48,9 @@ struct ShotOutcome {
 // black, the worst moment of all.
 Outcome OutcomeOf(const std::vector<ShotOutcome>& shots);
 
-// `source`: see MotionOfSource.
-Outcome MeasureOutcome(const ShownMotion& source, const ShownMotion& shown,
-                       double frames_per_second);
+// What the source shows, as if it were a steadied clip; see MotionOfSource.
+Outcome MeasureSource(const ShownMotion& source, double frames_per_second);
+// `source`: what that tells of it.
+Outcome MeasureOutcome(const Outcome& source, const ShownMotion& shown, double frames_per_second);
 
 }  // namespace calmframe::host

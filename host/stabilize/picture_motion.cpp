@@ -5,9 +5,11 @@
 #include <cmath>
 #include <cstddef>
 #include <optional>
+#include <utility>
 
 #include "host/stabilize/homography.h"
 #include "host/stabilize/median.h"
+#include "host/stabilize/track_paths.h"
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
 
@@ -19,18 +21,13 @@ struct TrackPairs {
   std::vector<Point> before, now;  // equally many
 };
 
-TrackPairs PairsOf(const WarpedPlane& plane, std::size_t frame) {
-  const SolvedClip& clip = plane.clip();
+TrackPairs PairsOf(const TrackRow& before, const TrackRow& now) {
   TrackPairs pairs;
-  const auto slots = static_cast<std::size_t>(clip.slots);
-  for (std::size_t s = 0; s < slots; ++s) {
-    const std::size_t now = frame * slots + s, before = now - slots;
-    if (clip.statuses[now] != 0 || clip.statuses[before] < 0) continue;
-    const Point here = plane.At(frame, clip.tracks[now]);
-    const Point there = plane.At(frame - 1, clip.tracks[before]);
-    if (!IsInReach(here) || !IsInReach(there)) continue;
-    pairs.now.push_back(here);
-    pairs.before.push_back(there);
+  for (std::size_t s = 0; s < now.statuses.size(); ++s) {
+    if (now.statuses[s] != 0 || before.statuses[s] < 0) continue;
+    if (!IsInReach(now.places[s]) || !IsInReach(before.places[s])) continue;
+    pairs.now.push_back(now.places[s]);
+    pairs.before.push_back(before.places[s]);
   }
   return pairs;
 }
@@ -73,47 +70,18 @@ Cells Residuals(const TrackPairs& pairs, const Similarity& start, double width, 
   return cells;
 }
 
-std::vector<double> Flicker(const std::vector<Cells>& cells) {
-  std::vector<double> flicker(cells.size(), 0);
-  for (std::size_t f = 1; f + 1 < cells.size(); ++f) {
-    double sum = 0;
-    int count = 0;
-    for (std::size_t c = 0; c < cells[f].size(); ++c) {
-      const auto &now = cells[f][c], &before = cells[f - 1][c], &after = cells[f + 1][c];
-      if (!now || !before || !after) continue;
-      const double x = now->x - (before->x + after->x) / 2;
-      const double y = now->y - (before->y + after->y) / 2;
-      sum += (x * x + y * y) / 1.5;  // of three independent values the variance is that of one
-      ++count;
-    }
-    if (count > 0) flicker[f] = std::sqrt(sum / count);
+// Of a frame between two others.
+double Flicker(const Cells& before, const Cells& now, const Cells& after) {
+  double sum = 0;
+  int count = 0;
+  for (std::size_t c = 0; c < now.size(); ++c) {
+    if (!now[c] || !before[c] || !after[c]) continue;
+    const double x = now[c]->x - (before[c]->x + after[c]->x) / 2;
+    const double y = now[c]->y - (before[c]->y + after[c]->y) / 2;
+    sum += (x * x + y * y) / 1.5;  // of three independent values the variance is that of one
+    ++count;
   }
-  return flicker;
-}
-
-// Of at least five frames.
-std::vector<TrackPath> PathsOf(const WarpedPlane& plane) {
-  const SolvedClip& clip = plane.clip();
-  std::vector<TrackPath> paths;
-  const auto slots = static_cast<std::size_t>(clip.slots);
-  const auto frames = static_cast<std::size_t>(clip.frame_count);
-  for (std::size_t s = 0; s < slots; ++s) {
-    TrackPath path;
-    const auto end = [&] {
-      if (path.points.size() >= 5) paths.push_back(path);
-      path.points.clear();
-    };
-    for (std::size_t f = 0; f < frames; ++f) {
-      const std::int32_t status = clip.statuses[f * slots + s];
-      if (status != 0) end();
-      if (status < 0) continue;
-      if (path.points.empty()) path.first = f;
-      path.points.push_back(plane.At(f, clip.tracks[f * slots + s]));
-      if (!IsInReach(path.points.back())) path.points.clear();
-    }
-    end();
-  }
-  return paths;
+  return count > 0 ? std::sqrt(sum / count) : 0;
 }
 
 }  // namespace
@@ -121,18 +89,37 @@ std::vector<TrackPath> PathsOf(const WarpedPlane& plane) {
 PictureMotion FindMotion(const WarpedPlane& plane) {
   const SolvedClip& clip = plane.clip();
   const auto frames = static_cast<std::size_t>(clip.frame_count);
-  PictureMotion motion{std::vector<Similarity>(frames), {}, {}};
-  std::vector<Cells> cells(frames);
-  tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
-      [&](std::size_t before) {
-        const std::size_t f = before + 1;
-        const TrackPairs pairs = PairsOf(plane, f);
-        motion.background[f] = FitMotion(pairs.now, pairs.before, kTrackTolerance * clip.width);
-        cells[f] = Residuals(pairs, Inverse(motion.background[f]), clip.width, clip.height);
-      },
-      frames - 1);
-  motion.wobble = Flicker(cells);
-  motion.paths = PathsOf(plane);
+  PictureMotion motion{std::vector<Similarity>(frames), std::vector<double>(frames, 0)};
+  // A stretch of frames after the other, so that no more than its rows are there at a time.
+  constexpr std::size_t kStretch = 256;
+  TrackRow last;
+  Cells before_last_cells, last_cells;
+  for (std::size_t first = 0; first < frames; first += kStretch) {
+    const std::size_t count = std::min(kStretch, frames - first);
+    std::vector<TrackRow> rows(count);
+    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+        [&](std::size_t i) {
+          rows[i] = RowInPlane(plane.Frame(first + i), clip.TracksOf(first + i));
+        },
+        count);
+    std::vector<Cells> cells(count);
+    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
+        [&](std::size_t i) {
+          const std::size_t f = first + i;
+          if (f == 0) return;
+          const TrackPairs pairs = PairsOf(i > 0 ? rows[i - 1] : last, rows[i]);
+          motion.background[f] = FitMotion(pairs.now, pairs.before, kTrackTolerance * clip.width);
+          cells[i] = Residuals(pairs, Inverse(motion.background[f]), clip.width, clip.height);
+        },
+        count);
+    for (std::size_t i = 0; i < count; ++i) {
+      if (first + i >= 2) {
+        motion.wobble[first + i - 1] = Flicker(before_last_cells, last_cells, cells[i]);
+      }
+      before_last_cells = std::exchange(last_cells, std::move(cells[i]));
+    }
+    last = std::move(rows.back());
+  }
   return motion;
 }
 

@@ -7,12 +7,6 @@
 
 namespace calmframe::host {
 
-// Where one feature is in consecutive frames.
-struct TrackPath {
-  std::size_t first = 0;  // frame
-  std::vector<Point> points;
-};
-
 // How the picture moves in a plane, frame by frame.
 struct PictureMotion {
   // Takes a point of the background to its place in the frame before; pixels about the frame's
@@ -23,7 +17,6 @@ struct PictureMotion {
   // tracks, less the mean of the two neighbours in time, so that parallax, which lasts, drops out;
   // root mean square over the cells. 0 where nothing can be told.
   std::vector<double> wobble;
-  std::vector<TrackPath> paths;  // of the tracks, pixels about the frame's middle
 };
 
 // By the tracks of the plane's clip that are not deleted. Uses all processors; the same on any

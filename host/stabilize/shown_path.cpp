@@ -17,9 +17,10 @@ std::vector<WindowPlace> PlacesOf(const WarpedPlane& plane, const std::vector<Si
   std::vector<WindowPlace> places;
   places.reserve(windows.size());
   for (std::size_t f = 0; f < windows.size(); ++f) {
+    const PlaneFrame frame = plane.Frame(f);
     const auto in_source = [&](Point output) {
       const Point at = windows[f](output);
-      const Point source = plane.SourceAt(f, {at.x - middle.x, at.y - middle.y});
+      const Point source = frame.SourceAt({at.x - middle.x, at.y - middle.y});
       return Point{source.x * square - middle.x, source.y - middle.y};
     };
     WindowPlace place;

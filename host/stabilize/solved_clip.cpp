@@ -5,13 +5,13 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
-#include <string>
+#include <memory>
+#include <utility>
 
 #include "host/stabilize/centred_bounds.h"
 #include "host/stabilize/homography.h"
 #include "host/stabilize/solved_grid.h"
 #include "host/stabilize/solved_payload.h"
-#include "platform/tessel/filesupport.h"
 
 namespace calmframe::host {
 namespace {
@@ -35,21 +35,21 @@ Side WholeFrame(double least, std::int32_t pixels) {
   return {first, last};
 }
 
-std::string CropOfWholeFrame(const SolvedLayout& layout, const OutlineBounds& bounds) {
+void AppendCropOfWholeFrame(const SolvedLayout& layout, const OutlineBounds& bounds,
+                            InstanceWriter& out) {
   const auto width = static_cast<std::int32_t>(layout.square_width());
   const std::int32_t height = layout.source_height;
   const Side x = WholeFrame(bounds.least.x, width), y = WholeFrame(bounds.least.y, height);
   const auto mask = [](double least, double most) {
     return static_cast<std::int32_t>(std::ceil(std::max(Tame(most - least), 0.0)));
   };
-  tessel::filesupport::OStringByteStream out;
-  out << true << layout.frames << mask(bounds.least.x, bounds.most.x)
-      << mask(bounds.least.y, bounds.most.y);
+  out.Append(std::uint8_t{1});
   // One pixel more than the frame: with the one that the effect adds to the frame, scale 1 exactly.
-  out << width + 1 << height + 1;
+  out.Append(std::array<std::int32_t, 5>{layout.frames, mask(bounds.least.x, bounds.most.x),
+                                         mask(bounds.least.y, bounds.most.y), width + 1,
+                                         height + 1});
   const SolvedClip::Window window = {x.first, y.first, x.last, y.last};
-  for (std::int32_t f = 0; f < layout.frames; ++f) out.Write(&window, sizeof window);
-  return out.Take();
+  for (std::int32_t f = 0; f < layout.frames; ++f) out.Append(window);
 }
 
 std::size_t StoredCropBytes(const SolvedPayload& payload) {
@@ -66,16 +66,42 @@ Matrix MatrixOf(const Similarity& s) {
 // Entries of the frame map are motions to the output of their second frame. then_of(frame): what
 // comes behind those to its output.
 template <class ThenOf>
-void MoveFrameMap(SolvedPayload& payload, const ThenOf& then_of) {
+void AppendMovedMap(const SolvedPayload& payload, const ThenOf& then_of, InstanceWriter& out) {
   std::size_t place = payload.layout.map;
   for (std::size_t i = 0; i < payload.layout.map_entries; ++i) {
     const auto frames = payload.At<std::array<std::int32_t, 2>>(place);
+    out.Append(frames);
     place += kMapKeyBytes;
     const Matrix then = then_of(static_cast<std::size_t>(frames[1]));
-    payload.Put(place, Product(then, payload.At<Matrix>(place)));
+    out.Append(Product(then, payload.At<Matrix>(place)));
     place += kMatrixBytes;
   }
 }
+
+// -- Frames --
+
+// As an instance has them.
+class StoredFrames final : public SolvedFrames {
+ public:
+  explicit StoredFrames(std::vector<std::uint8_t> instance)
+      : instance_(std::move(instance)), payload_(ReadPayload(instance_)) {
+    if (!payload_.inflated.empty()) instance_ = {};
+  }
+
+  const SolvedPayload& payload() const { return payload_; }
+  void ReadVertices(std::size_t frame, std::vector<Point>& vertices) const override {
+    StoredWarp warp;
+    payload_.Read(frame, warp);
+    WarpGrid grid(payload_.layout);
+    grid.Take(warp);
+    vertices = grid.TakeVertices();
+  }
+  void ReadTracks(std::size_t frame, TrackRow& row) const override { payload_.Read(frame, row); }
+
+ private:
+  std::vector<std::uint8_t> instance_;
+  const SolvedPayload payload_;  // refers to it
+};
 
 // Takes frames of that size from where a warp puts them back to where they stand, as near as one
 // homography comes to all vertices.
@@ -125,10 +151,24 @@ std::vector<Similarity> Inverses(const std::vector<Similarity>& windows) {
 
 }  // namespace
 
-SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
-  const SolvedPayload payload = ReadPayload(instance);
+std::vector<Point> SolvedClip::VerticesOf(std::size_t frame) const {
+  std::vector<Point> vertices;
+  frames->ReadVertices(frame, vertices);
+  return vertices;
+}
+
+TrackRow SolvedClip::TracksOf(std::size_t frame) const {
+  TrackRow row;
+  frames->ReadTracks(frame, row);
+  return row;
+}
+
+SolvedClip ReadSolvedClip(std::vector<std::uint8_t> instance) {
+  const auto frames = std::make_shared<const StoredFrames>(std::move(instance));
+  const SolvedPayload& payload = frames->payload();
   const SolvedLayout& layout = payload.layout;
   SolvedClip clip;
+  clip.frames = frames;
   clip.source_width = layout.source_width;
   clip.source_height = clip.height = layout.source_height;
   clip.width = static_cast<int>(layout.square_width());
@@ -137,25 +177,6 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
   clip.columns = layout.columns;
   clip.rows = layout.rows;
   clip.slots = layout.slots;
-
-  WarpGrid grid(layout);
-  OutlineBounds bounds;
-  clip.vertices.reserve(static_cast<std::size_t>(clip.frame_count) * layout.vertices());
-  for (std::size_t f = 0; f < static_cast<std::size_t>(clip.frame_count); ++f) {
-    grid.Read(payload, WarpGrid::PlaceOf(f, layout));
-    bounds.Add(grid);
-    clip.vertices.insert(clip.vertices.end(), grid.vertices().begin(), grid.vertices().end());
-  }
-
-  constexpr double kTrackStep = 1.0 / 32;
-  const std::size_t statuses = layout.tracks + layout.cells() * kPositionBytes;
-  clip.tracks.reserve(layout.cells());
-  clip.statuses.resize(layout.cells());
-  for (std::size_t i = 0; i < layout.cells(); ++i) {
-    const auto steps = payload.At<std::array<std::int32_t, 2>>(layout.tracks + i * kPositionBytes);
-    clip.tracks.push_back({steps[0] * kTrackStep, steps[1] * kTrackStep});
-  }
-  std::memcpy(clip.statuses.data(), payload.bytes.data() + statuses, layout.cells() * kStatusBytes);
 
   clip.neighbours.reserve(layout.map_entries);
   for (std::size_t i = 0; i < layout.map_entries; ++i) {
@@ -167,7 +188,8 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
 
   if (layout.has_crop) {
     const auto fields = payload.At<std::array<std::int32_t, 5>>(layout.crop + 1);
-    clip.crop = {.width = fields[3], .height = fields[4], .origin = bounds.least, .windows = {}};
+    clip.crop = {
+        .width = fields[3], .height = fields[4], .origin = BoundsOf(clip).least, .windows = {}};
     clip.crop->windows.resize(static_cast<std::size_t>(fields[0]));
     std::memcpy(clip.crop->windows.data(), payload.bytes.data() + layout.crop + 1 + sizeof fields,
                 clip.crop->windows.size() * sizeof(SolvedClip::Window));
@@ -178,7 +200,7 @@ SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance) {
 std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
                                       const std::vector<Similarity>& windows, Warps warps,
                                       PlacedBy placed_by) {
-  SolvedPayload payload = ReadPayload(instance);
+  const SolvedPayload payload = ReadPayload(instance);
   const SolvedLayout& layout = payload.layout;
   if (windows.size() != static_cast<std::size_t>(layout.frames)) {
     throw std::invalid_argument("windows of another clip");
@@ -189,18 +211,22 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
   const double width = layout.square_width(), height = layout.source_height;
   WarpGrid rest(layout);
   rest.Rest(width, height);
+  const auto solved_grid = [&](std::size_t f) {
+    StoredWarp warp;
+    payload.Read(f, warp);
+    WarpGrid grid(layout);
+    grid.Take(warp);
+    return grid;
+  };
   std::vector<Matrix> unbent;
   if (warps == Warps::none) {
     const Unbending unbending(rest, width, height);
-    WarpGrid bent(layout);
     for (std::size_t f = 0; f < frames; ++f) {
-      bent.Read(payload, WarpGrid::PlaceOf(f, layout));
-      unbent.push_back(unbending(bent.vertices().data()));
+      unbent.push_back(unbending(solved_grid(f).vertices().data()));
     }
   }
   const auto grid_of = [&](std::size_t f) {
-    WarpGrid grid = rest;
-    if (warps == Warps::solved) grid.Read(payload, WarpGrid::PlaceOf(f, layout));
+    WarpGrid grid = warps == Warps::solved ? solved_grid(f) : rest;
     grid.Move(output_from_plane[f]);
     return grid;
   };
@@ -220,25 +246,36 @@ std::vector<std::uint8_t> WithWindows(const std::vector<std::uint8_t>& instance,
     motion.dx -= back.x;
     motion.dy -= back.y;
   }
+  constexpr std::size_t kMore = 1 << 16;  // offsets that are packed take other sizes than before
+  InstanceWriter out(payload.form, payload.bytes.size() + payload.bytes.size() / 8 +
+                                       frames * sizeof(SolvedClip::Window) + kMore);
+  out.Append(payload.bytes.first(layout.warps));
   bounds = {};
   for (std::size_t f = 0; f < frames; ++f) {
     WarpGrid grid = grid_of(f);
     for (const Pull& pull : pulls) {
       if (pull.frame == f) grid.corner(pull.corner).*pull.axis = pull.to;
     }
-    grid.Write(payload, WarpGrid::PlaceOf(f, layout));
-    grid.Read(payload, WarpGrid::PlaceOf(f, layout));
+    const StoredWarp warp = grid.Stored();
+    out.Append(warp, grid.columns());
+    grid.Take(warp);
     bounds.Add(grid);
   }
-  MoveFrameMap(payload, [&](std::size_t f) {
-    const Matrix moved = MatrixOf(output_from_plane[f]);
-    return unbent.empty() ? moved : Product(moved, unbent[f]);
-  });
+  const std::size_t map_end = layout.map + layout.map_entries * (kMapKeyBytes + kMatrixBytes);
+  out.Append(payload.bytes.subspan(layout.warps_end, layout.map - layout.warps_end));
+  AppendMovedMap(
+      payload,
+      [&](std::size_t f) {
+        const Matrix moved = MatrixOf(output_from_plane[f]);
+        return unbent.empty() ? moved : Product(moved, unbent[f]);
+      },
+      out);
+  out.Append(payload.bytes.subspan(map_end, layout.crop - map_end));
   const OutlineBounds in_output = {{bounds.least.x + back.x, bounds.least.y + back.y},
                                    {bounds.most.x + back.x, bounds.most.y + back.y}};
-  payload.bytes.replace(layout.crop, StoredCropBytes(payload), CropOfWholeFrame(layout, in_output));
-
-  return InstanceOf(payload.bytes);
+  AppendCropOfWholeFrame(layout, in_output, out);
+  out.Append(payload.bytes.subspan(layout.crop + StoredCropBytes(payload)));
+  return out.Take();
 }
 
 namespace {
@@ -261,8 +298,8 @@ std::vector<SolvedClip::Neighbour> NeighboursIn(const SolvedClip& clip, Warps wa
   const WarpGrid rest = RestingGrid(clip);
   const Unbending unbending(rest, clip.width, clip.height);
   std::vector<Matrix> unbent;
-  for (std::size_t at = 0; at < clip.vertices.size(); at += rest.vertices().size()) {
-    unbent.push_back(unbending(clip.vertices.data() + at));
+  for (std::size_t f = 0; f < static_cast<std::size_t>(clip.frame_count); ++f) {
+    unbent.push_back(unbending(clip.VerticesOf(f).data()));
   }
   for (SolvedClip::Neighbour& neighbour : neighbours) {
     neighbour.plane_from_frame =

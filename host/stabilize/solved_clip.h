@@ -1,6 +1,8 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <stdexcept>
 #include <vector>
@@ -16,6 +18,28 @@
 // as large as a frame.
 namespace calmframe::host {
 
+// A frame's row of the track table, by slot: where the track is, in the source's own pixels,
+// centres at whole numbers; and what it is: n > 0 a track that begins here, in row n - 1; 0 one
+// that goes on; -10 and -11 the two of one that is deleted, which nothing was solved with; else
+// below 0 none here, and the place means nothing.
+struct TrackRow {
+  std::vector<Point> places;
+  std::vector<std::int32_t> statuses;
+
+  bool operator==(const TrackRow&) const = default;
+};
+
+// What a clip has of each frame, which is expanded when it is asked for: of all of them at once it
+// would be many times as large as what it comes from. Any thread.
+class SolvedFrames {
+ public:
+  virtual ~SolvedFrames() = default;
+  // By row and column: where each vertex lands in the stabilized plane, before crop and scale. A
+  // frame without a solution has zeros. From a file they may be any number, and none.
+  virtual void ReadVertices(std::size_t frame, std::vector<Point>& vertices) const = 0;
+  virtual void ReadTracks(std::size_t frame, TrackRow& row) const = 0;
+};
+
 struct SolvedClip {
   int source_width = 0, source_height = 0;  // of a frame, in its own pixels
   int width = 0, height = 0;                // the same in square pixels
@@ -27,17 +51,11 @@ struct SolvedClip {
   // Vertices of a warp's grid, at least 2 each. They stand evenly over the frame, the outermost on
   // its first and last pixel centres.
   int columns = 0, rows = 0;
-  // By frame, row, column: where each lands in the stabilized plane, before crop and scale. A frame
-  // without a solution has zeros. From a file they may be any number, and none.
-  std::vector<Point> vertices;
+  int slots = 0;                               // places for tracks in a frame, at least 1
+  std::shared_ptr<const SolvedFrames> frames;  // never null
 
-  // Places for tracks in a frame, at least 1. By frame and slot: where the track is, in the
-  // source's own pixels, centres at whole numbers; and what it is: n > 0 a track that begins here,
-  // in row n - 1; 0 one that goes on; -10 and -11 the two of one that is deleted, which nothing was
-  // solved with; else below 0 none here, and the position means nothing.
-  int slots = 0;
-  std::vector<Point> tracks;
-  std::vector<std::int32_t> statuses;
+  std::vector<Point> VerticesOf(std::size_t frame) const;
+  TrackRow TracksOf(std::size_t frame) const;
 
   // What a framing that fills the edges lays behind a frame: another one, whose pixels the matrix
   // takes to the stabilized plane, where frame `in` stands. From a file it may be any, and of no
@@ -66,9 +84,9 @@ class NoSolvedClip : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
-// Of a flattened instance, as SavedEffect has it. Throws NoSolvedClip; of counts no memory is taken
-// before the bytes are there.
-SolvedClip ReadSolvedClip(const std::vector<std::uint8_t>& instance);
+// Of a flattened instance, as SavedEffect has it, which the clip keeps. Throws NoSolvedClip; of
+// counts no memory is taken before the bytes are there.
+SolvedClip ReadSolvedClip(std::vector<std::uint8_t> instance);
 
 // A frame's warp as it was solved, or none: then the stabilized plane is the source itself.
 enum class Warps { solved, none };

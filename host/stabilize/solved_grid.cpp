@@ -68,27 +68,24 @@ void WarpGrid::ForEach(const std::array<Point, 4>& corners, const Visit& visit) 
   }
 }
 
-void WarpGrid::Read(const SolvedPayload& payload, std::size_t place) {
-  const auto corners = payload.At<std::array<Point, 4>>(place);
-  place += kCornerBytes;
-  ForEach(corners, [&](Point& vertex, Point flat) {
-    const auto steps = payload.At<std::array<std::int32_t, 2>>(place);
-    place += sizeof steps;
-    vertex = {static_cast<double>(static_cast<float>(steps[0]) / kStepsPerPixel) + flat.x,
-              static_cast<double>(static_cast<float>(steps[1]) / kStepsPerPixel) + flat.y};
+void WarpGrid::Take(const StoredWarp& warp) {
+  const std::int32_t* next = warp.offsets.data();
+  ForEach(warp.corners, [&](Point& vertex, Point flat) {
+    vertex = {static_cast<double>(static_cast<float>(next[0]) / kStepsPerPixel) + flat.x,
+              static_cast<double>(static_cast<float>(next[1]) / kStepsPerPixel) + flat.y};
+    next += 2;
   });
-  for (std::size_t i = 0; i < corners.size(); ++i) corner(i) = corners[i];
+  for (std::size_t i = 0; i < warp.corners.size(); ++i) corner(i) = warp.corners[i];
 }
 
-void WarpGrid::Write(SolvedPayload& payload, std::size_t place) {
-  const std::array<Point, 4> corners = {corner(0), corner(1), corner(2), corner(3)};
-  payload.Put(place, corners);
-  place += kCornerBytes;
-  ForEach(corners, [&](const Point& vertex, Point flat) {
-    const std::array<std::int32_t, 2> steps = {Steps(vertex.x - flat.x), Steps(vertex.y - flat.y)};
-    payload.Put(place, steps);
-    place += sizeof steps;
+StoredWarp WarpGrid::Stored() {
+  StoredWarp warp{{corner(0), corner(1), corner(2), corner(3)}, {}};
+  warp.offsets.reserve(2 * vertices_.size());
+  ForEach(warp.corners, [&](const Point& vertex, Point flat) {
+    warp.offsets.push_back(Steps(vertex.x - flat.x));
+    warp.offsets.push_back(Steps(vertex.y - flat.y));
   });
+  return warp;
 }
 
 void WarpGrid::Rest(double width, double height) {
@@ -117,11 +114,12 @@ void OutlineBounds::Add(const Point* vertices, std::size_t columns, std::size_t 
 }
 
 OutlineBounds BoundsOf(const SolvedClip& clip) {
-  const auto columns = static_cast<std::size_t>(clip.columns);
-  const auto rows = static_cast<std::size_t>(clip.rows);
   OutlineBounds bounds;
-  for (std::size_t at = 0; at < clip.vertices.size(); at += columns * rows) {
-    bounds.Add(clip.vertices.data() + at, columns, rows);
+  std::vector<Point> vertices;
+  for (std::size_t f = 0; f < static_cast<std::size_t>(clip.frame_count); ++f) {
+    clip.frames->ReadVertices(f, vertices);
+    bounds.Add(vertices.data(), static_cast<std::size_t>(clip.columns),
+               static_cast<std::size_t>(clip.rows));
   }
   return bounds;
 }

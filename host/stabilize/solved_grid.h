@@ -3,6 +3,7 @@
 #include <array>
 #include <cstddef>
 #include <limits>
+#include <utility>
 #include <vector>
 
 #include "host/stabilize/similarity.h"
@@ -18,17 +19,10 @@ class WarpGrid {
   explicit WarpGrid(const SolvedLayout& layout)
       : WarpGrid(static_cast<std::size_t>(layout.columns), static_cast<std::size_t>(layout.rows)) {}
 
-  static std::size_t StoredBytes(const SolvedLayout& layout) {
-    return kCornerBytes + layout.vertices() * kOffsetBytes;
-  }
-  // Of a frame's warp in the payload.
-  static std::size_t PlaceOf(std::size_t frame, const SolvedLayout& layout) {
-    return layout.warps + frame * StoredBytes(layout);
-  }
-
-  void Read(const SolvedPayload& payload, std::size_t place);
-  // In as many bytes as it was read from. Rounds all vertices but the corners to 1/256 pixel.
-  void Write(SolvedPayload& payload, std::size_t place);
+  // Of as many vertices.
+  void Take(const StoredWarp& warp);
+  // Rounds all vertices but the corners to 1/256 pixel.
+  StoredWarp Stored();
   // Every vertex where it stands in a frame of that size.
   void Rest(double width, double height);
   void Move(const Similarity& motion) {
@@ -38,6 +32,7 @@ class WarpGrid {
   std::size_t columns() const { return columns_; }
   std::size_t rows() const { return rows_; }
   const std::vector<Point>& vertices() const { return vertices_; }
+  std::vector<Point> TakeVertices() { return std::move(vertices_); }  // leaves none
   // Top left, top right, bottom left, bottom right, as they are stored.
   Point& corner(std::size_t i) { return vertices_[corners_[i]]; }
   const Point& corner(std::size_t i) const { return vertices_[corners_[i]]; }

@@ -4,7 +4,11 @@
 #include <array>
 #include <cmath>
 #include <limits>
+#include <string>
+#include <utility>
 
+#include "platform/memory/packed_grid.h"
+#include "platform/memory/packed_words.h"
 #include "platform/tessel/filesupport.h"
 
 namespace calmframe::host {
@@ -15,6 +19,8 @@ using tessel::filesupport::StreamError;
 
 constexpr std::uint32_t kVersion = 16;
 constexpr std::int32_t kSolved = 2;
+// As many as a grid has over the widest frame, and more.
+constexpr std::size_t kMostPackedVertices = std::size_t{1} << 16;
 constexpr std::int32_t kMost = std::numeric_limits<std::int32_t>::max();
 
 // What stands before a payload.
@@ -35,27 +41,37 @@ constexpr std::int32_t Marker(const char (&letters)[5]) {
   return marker;
 }
 
-// Passes all it reads on into a copy.
-class CopiedStream final : public InputByteStream {
+// Tells where it stands, and passes all that it reads on into a copy, if there is one.
+class WalkedStream final : public InputByteStream {
  public:
-  CopiedStream(InputByteStream& in, std::string& copy) : in_(in), copy_(copy) {}
+  WalkedStream(InputByteStream& in, std::vector<std::uint8_t>* copy) : in_(in), copy_(copy) {}
   std::size_t ReadSome(void* data, std::size_t size) override {
     const std::size_t got = in_.ReadSome(data, size);
-    copy_.append(static_cast<const char*>(data), got);
+    const auto* const bytes = static_cast<const std::uint8_t*>(data);
+    if (copy_) copy_->insert(copy_->end(), bytes, bytes + got);
+    position_ += got;
     return got;
   }
   std::uint64_t MaxBytesLeft() const override { return in_.MaxBytesLeft(); }
-  std::size_t position() const { return copy_.size(); }
+  std::size_t position() const { return position_; }
 
  private:
   InputByteStream& in_;
-  std::string& copy_;
+  std::vector<std::uint8_t>* const copy_;
+  std::size_t position_ = 0;
 };
+
+constexpr std::size_t kCornerBytes = 4 * 2 * sizeof(double);
+constexpr std::size_t kOffsetBytes = 2 * sizeof(std::int32_t);  // of a vertex
+// Of a cell of the track table; raw, positions and statuses stand apart.
+constexpr std::size_t kPositionBytes = 2 * sizeof(std::int32_t);
+constexpr std::size_t kStatusBytes = sizeof(std::int32_t);
 
 // Walks over a payload from end to end.
 class LayoutReader {
  public:
-  explicit LayoutReader(CopiedStream& in) : in_(in) {}
+  LayoutReader(WalkedStream& in, PayloadForm form)
+      : in_(in), is_packed_(form == PayloadForm::packed) {}
 
   SolvedLayout Read() {
     ReadAnalysis();
@@ -63,7 +79,11 @@ class LayoutReader {
     Expect(Marker("StrF"), "StrF");
     in_ >> layout_.first_frame;
     layout_.tracks = in_.position();
-    Skip(layout_.cells(), kPositionBytes + kStatusBytes);
+    if (is_packed_) {
+      SkipPacked(0, layout_.packed_tracks);
+    } else {
+      Skip(layout_.cells(), kPositionBytes + kStatusBytes);
+    }
     ReadCrop();
     Expect(Marker("Pup "), "Pup");
     return layout_;
@@ -84,12 +104,22 @@ class LayoutReader {
   }
   // By pieces: a zip stream's bound may lie far above what it holds.
   void Skip(std::uint64_t count, std::uint64_t size) {
+    if (size == 0) return;
     Check(count <= in_.MaxBytesLeft() / size, "more records than bytes");
     std::array<char, 1 << 14> piece;
     for (std::uint64_t left = count * size; left > 0;) {
       const std::size_t bytes = std::min<std::uint64_t>(left, piece.size());
       in_.Read(piece.data(), bytes);
       left -= bytes;
+    }
+  }
+
+  // One record a frame: so many bytes, then a count, and as many.
+  void SkipPacked(std::uint64_t ahead, std::vector<std::size_t>& places) {
+    for (std::int32_t f = 0; f < layout_.frames; ++f) {
+      places.push_back(in_.position());
+      Skip(1, ahead);
+      Skip(Next<std::uint32_t>(), 1);
     }
   }
 
@@ -123,12 +153,19 @@ class LayoutReader {
     Next<std::int64_t>();  // and the crop
     Expect(Marker("Mesh"), "Mesh");
     in_ >> layout_.columns >> layout_.rows;
+    // What stands in so many bytes, or is packed, has no more vertices.
     Check(layout_.columns > 1 && layout_.rows > 1 &&
-              layout_.vertices() <= in_.MaxBytesLeft() / kOffsetBytes,
+              layout_.vertices() <=
+                  (is_packed_ ? kMostPackedVertices : in_.MaxBytesLeft() / kOffsetBytes),
           "no grid");
     layout_.warps = in_.position();
-    Skip(static_cast<std::uint64_t>(layout_.frames),
-         kCornerBytes + layout_.vertices() * kOffsetBytes);
+    if (is_packed_) {
+      SkipPacked(kCornerBytes, layout_.packed_warps);
+    } else {
+      Skip(static_cast<std::uint64_t>(layout_.frames),
+           kCornerBytes + layout_.vertices() * kOffsetBytes);
+    }
+    layout_.warps_end = in_.position();
 
     Expect(Marker("MtoN"), "MtoN");
     const auto entries = Next<std::int32_t>();
@@ -155,7 +192,8 @@ class LayoutReader {
     Skip(static_cast<std::uint64_t>(windows), sizeof(SolvedClip::Window));
   }
 
-  CopiedStream& in_;
+  WalkedStream& in_;
+  const bool is_packed_;
   SolvedLayout layout_;
 };
 
@@ -166,7 +204,7 @@ double SolvedLayout::square_width() const {
   return std::max(std::floor(width + 0.5), 1.0);
 }
 
-SolvedPayload ReadPayload(const std::vector<std::uint8_t>& instance) try {
+SolvedPayload ReadPayload(std::span<const std::uint8_t> instance) try {
   Header header;
   if (instance.size() < sizeof header) throw StreamError("data ends early");
   std::memcpy(&header, instance.data(), sizeof header);
@@ -174,30 +212,111 @@ SolvedPayload ReadPayload(const std::vector<std::uint8_t>& instance) try {
   if (header.flattened != 1) throw StreamError("of an instance at work");
   if (header.payload_length > instance.size() - sizeof header) throw StreamError("data ends early");
 
-  tessel::filesupport::IStringByteStream stored(instance.data() + sizeof header,
-                                                static_cast<std::size_t>(header.payload_length));
+  const std::span stored =
+      instance.subspan(sizeof header, static_cast<std::size_t>(header.payload_length));
+  tessel::filesupport::IStringByteStream bytes(stored.data(), stored.size());
   SolvedPayload payload;
   if (header.raw) {
-    CopiedStream in(stored, payload.bytes);
-    payload.layout = LayoutReader(in).Read();
-    if (stored.MaxBytesLeft() != 0) throw StreamError("more data than was expected");
+    if (header.raw == static_cast<std::uint8_t>(PayloadForm::packed)) {
+      payload.form = PayloadForm::packed;
+    }
+    payload.bytes = stored;
+    WalkedStream in(bytes, nullptr);
+    payload.layout = LayoutReader(in, payload.form).Read();
+    if (bytes.MaxBytesLeft() != 0) throw StreamError("more data than was expected");
   } else {
-    tessel::filesupport::IZipByteStream inflated(stored);
-    CopiedStream in(inflated, payload.bytes);
-    payload.layout = LayoutReader(in).Read();
+    tessel::filesupport::IZipByteStream inflated(bytes);
+    WalkedStream in(inflated, &payload.inflated);
+    payload.layout = LayoutReader(in, payload.form).Read();
     inflated.Finish();
+    payload.bytes = payload.inflated;
   }
   return payload;
 } catch (const StreamError& error) {
   throw NoSolvedClip(std::string("not of a solved effect: ") + error.what());
 }
 
-std::vector<std::uint8_t> InstanceOf(const std::string& payload) {
-  const Header header = {kVersion, 1, 1, {}, 0, payload.size()};
-  std::vector<std::uint8_t> instance(sizeof header + payload.size());
-  std::memcpy(instance.data(), &header, sizeof header);
-  std::memcpy(instance.data() + sizeof header, payload.data(), payload.size());
-  return instance;
+std::span<const std::uint8_t> SolvedPayload::Packed(std::size_t place) const {
+  return bytes.subspan(place + sizeof(std::uint32_t), At<std::uint32_t>(place));
+}
+
+void SolvedPayload::Read(std::size_t frame, StoredWarp& warp) const {
+  warp.offsets.resize(2 * layout.vertices());
+  if (form == PayloadForm::packed) {
+    const std::size_t place = layout.packed_warps[frame];
+    warp.corners = At<std::array<Point, 4>>(place);
+    if (!memory::UnpackGrid(Packed(place + kCornerBytes), static_cast<std::size_t>(layout.columns),
+                            warp.offsets)) {
+      throw NoSolvedClip("a packed warp's bytes are none");
+    }
+    return;
+  }
+  const std::size_t size = kCornerBytes + layout.vertices() * kOffsetBytes;
+  const std::size_t place = layout.warps + frame * size;
+  warp.corners = At<std::array<Point, 4>>(place);
+  std::memcpy(warp.offsets.data(), bytes.data() + place + kCornerBytes, size - kCornerBytes);
+}
+
+void SolvedPayload::Read(std::size_t frame, TrackRow& row) const {
+  constexpr double kTrackStep = 1.0 / 32;
+  const auto slots = static_cast<std::size_t>(layout.slots);
+  row.places.resize(slots);
+  row.statuses.resize(slots);
+  if (form == PayloadForm::packed) {
+    std::vector<std::int32_t> words(2 * slots);
+    const std::span<const std::uint8_t> packed = Packed(layout.packed_tracks[frame]);
+    std::size_t place = 0;
+    if (!memory::UnpackWords(packed, place, words) ||
+        !memory::UnpackWords(packed, place, row.statuses) || place != packed.size()) {
+      throw NoSolvedClip("a row of tracks is none");
+    }
+    const auto seed = static_cast<std::int32_t>(frame + 1);
+    for (std::size_t s = 0; s < slots; ++s) {
+      row.places[s] = {words[s] * kTrackStep, words[slots + s] * kTrackStep};
+      // A seed of this row is 1, and 1 what that would be.
+      std::int32_t& status = row.statuses[s];
+      if (status == 1 || status == seed) status = status == 1 ? seed : 1;
+    }
+    return;
+  }
+  const std::size_t first = frame * slots;
+  for (std::size_t s = 0; s < slots; ++s) {
+    const auto steps =
+        At<std::array<std::int32_t, 2>>(layout.tracks + (first + s) * kPositionBytes);
+    row.places[s] = {steps[0] * kTrackStep, steps[1] * kTrackStep};
+  }
+  std::memcpy(row.statuses.data(),
+              bytes.data() + layout.tracks + layout.cells() * kPositionBytes + first * kStatusBytes,
+              slots * kStatusBytes);
+}
+
+InstanceWriter::InstanceWriter(PayloadForm form, std::size_t size) : form_(form) {
+  instance_.reserve(sizeof(Header) + size);
+  instance_.resize(sizeof(Header));
+}
+
+void InstanceWriter::Append(std::span<const std::uint8_t> bytes) {
+  instance_.insert(instance_.end(), bytes.begin(), bytes.end());
+}
+
+void InstanceWriter::Append(const StoredWarp& warp, std::size_t columns) {
+  Append(warp.corners);
+  if (form_ == PayloadForm::packed) {
+    std::vector<std::uint8_t> packed;
+    memory::PackGrid(warp.offsets, columns, packed);
+    Append(static_cast<std::uint32_t>(packed.size()));
+    Append(std::span<const std::uint8_t>(packed));
+  } else {
+    Append(std::span(reinterpret_cast<const std::uint8_t*>(warp.offsets.data()),
+                     warp.offsets.size() * sizeof warp.offsets[0]));
+  }
+}
+
+std::vector<std::uint8_t> InstanceWriter::Take() {
+  const Header header = {kVersion, 1, static_cast<std::uint8_t>(form_),
+                         {},       0, instance_.size() - sizeof(Header)};
+  std::memcpy(instance_.data(), &header, sizeof header);
+  return std::move(instance_);
 }
 
 }  // namespace calmframe::host

@@ -121,12 +121,10 @@ void SteadyClip::SolveAnew(Watcher& watcher) {
 }
 
 SolvedClip SteadyClip::Solved() {
-  SavedEffect saved;
-  return worked_.Solved(&saved);
+  return worked_.Solved(nullptr);
 }
 
 std::shared_ptr<const MovingClip> SteadyClip::SolvedAndFramed(SavedEffect* saved) {
-  SavedEffect effect;
   if (found_of_ && !found_instance_.empty()) {
     if (saved) {
       saved->match_name = host().library().properties().match_name;
@@ -135,7 +133,8 @@ std::shared_ptr<const MovingClip> SteadyClip::SolvedAndFramed(SavedEffect* saved
     }
     return found_of_;
   }
-  SolvedClip solved = worked_.Solved(&effect);
+  SavedEffect effect;
+  SolvedClip solved = worked_.Solved(saved || keeps_found_ ? &effect : nullptr);
   if (!Crops(ValueOf(HX_FRAMING.disk_id))) solved.crop.reset();  // from a framing before
   const auto moving = found_of_ ? std::make_shared<const MovingClip>(std::move(solved), *found_of_)
                                 : std::make_shared<const MovingClip>(std::move(solved));
@@ -221,6 +220,7 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   Still still = as_set ? Still::all : request.still;
   const MotionGroups groups =
       still == Still::all ? MotionGroups() : FindMotionGroups(solved->clip());
+  worked_.GiveBack();
   if (still == Still::automatic) {
     constexpr double kCovers = 0.5;  // of the frame: less of the background hardly holds a picture
     still =
@@ -239,8 +239,10 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
     chooser.Consider({.name = "not bent", .warps = Warps::none}, *solved, true);
   }
   Effect* copy = nullptr;
+  solved.reset();  // and what is known of its motion, unless that is kept
+  worked_.GiveBack();
   if (request.may_choose && chooser.leaves_shake()) copy = TryControls(saved, chooser, watcher);
-  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed(solved->clip());
+  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed();
   if (copy && chooser.choice().best().changes.empty()) {  // then the controls stay, too
     worked_.session().Remove(*copy);
   } else if (copy) {
@@ -286,17 +288,17 @@ Effect* SteadyClip::TryControls(const SavedEffect& saved, Chooser& chooser, Watc
     for (const auto& [trial, copy] : copies) {
       bool is_best = false;
       if (!watcher.Stops() && WorkedEffect::IsReady(*copy)) {
-        SavedEffect of_copy;
         try {
           is_best =
               chooser.Consider({.name = trial->name, .changes = {{trial->disk_id, trial->value}}},
-                               WorkedEffect::SolvedBy(*copy, &of_copy, path()), true);
+                               WorkedEffect::SolvedBy(*copy, nullptr, path()), true);
         } catch (const SolveFailure&) {  // one that can't be had is none to choose
         }
       }
       if (is_best && best) worked_.session().Remove(*best);
       if (is_best) best = copy;
       if (!is_best) worked_.session().Remove(*copy);
+      worked_.GiveBack();
     }
     watcher.Show({.stage = "choosing",
                   .done = static_cast<double>(std::min(first + at_once, trials.size())) /
@@ -331,6 +333,7 @@ void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& win
   }
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;
   Effect& next = worked_.session().Load(worked_.LayerOfItsOwn(), saved);
+  saved = {};
   worked_.session().TickUntilSettled(std::chrono::hours(24), [&] { return watcher.Stops(); });
   try {
     if (watcher.Stops()) throw Interrupted();
@@ -343,6 +346,7 @@ void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& win
   DrawByItself(watcher);
   drawn_ = &next;
   windows_ = windows;
+  worked_.GiveBack();
   drawn_scale_ = shown.follows ? ValueOf(HX_ADDITIONAL_SCALE.disk_id) : 100;
 }
 
@@ -360,7 +364,9 @@ Outcome SteadyClip::Measure() {
   const SolvedClip& solved = moving->clip();
   const double zoom = Zoom(solved);
   const WarpedPlane plane(solved, Warps::solved);
-  Outcome outcome = MeasureOutcome(MotionOfSource(solved, *moving->motion(Warps::none)),
+  const Outcome source = MeasureSource(MotionOfSource(solved, *moving->motion(Warps::none)),
+                                       worked_.FramesPerSecond());
+  Outcome outcome = MeasureOutcome(source,
                                    MotionShown(plane, *moving->motion(Warps::solved),
                                                OwnWindows(solved, zoom), FillingOfEdges()),
                                    worked_.FramesPerSecond());

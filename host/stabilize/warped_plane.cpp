@@ -3,6 +3,9 @@
 #include <algorithm>
 #include <cmath>
 #include <limits>
+#include <memory>
+#include <utility>
+#include <vector>
 
 namespace calmframe::host {
 
@@ -10,25 +13,32 @@ Point Middle(const SolvedClip& clip) {
   return {(clip.width - 1) / 2.0, (clip.height - 1) / 2.0};
 }
 
-WarpedPlane::WarpedPlane(const SolvedClip& clip, Warps warps)
-    : clip_(clip),
-      vertices_(warps == Warps::solved ? clip.vertices : GridAtRest(clip)),
-      of_frame_(warps == Warps::solved
-                    ? vertices_.size() / static_cast<std::size_t>(clip.frame_count)
-                    : 0) {
+namespace {
+
+PlaneFrame::Vertices AboutMiddle(const SolvedClip& clip, std::vector<Point> vertices) {
   const Point middle = Middle(clip);
-  for (Point& vertex : vertices_) {
+  for (Point& vertex : vertices) {
     vertex.x -= middle.x;
     vertex.y -= middle.y;
   }
+  return std::make_shared<const std::vector<Point>>(std::move(vertices));
 }
 
-Point WarpedPlane::At(std::size_t frame, Point source) const {
-  const WarpView warp = Warp(frame);
-  const double u = source.x / (clip_.source_width - 1.0) * (clip_.columns - 1);
-  const double v = source.y / (clip_.source_height - 1.0) * (clip_.rows - 1);
-  const int c = static_cast<int>(std::clamp(u, 0.0, clip_.columns - 2.0));
-  const int r = static_cast<int>(std::clamp(v, 0.0, clip_.rows - 2.0));
+}  // namespace
+
+WarpedPlane::WarpedPlane(const SolvedClip& clip, Warps warps)
+    : clip_(clip), rest_(warps == Warps::none ? AboutMiddle(clip, GridAtRest(clip)) : nullptr) {}
+
+PlaneFrame WarpedPlane::Frame(std::size_t frame) const {
+  return {clip_, rest_ ? rest_ : AboutMiddle(clip_, clip_.VerticesOf(frame))};
+}
+
+Point PlaneFrame::At(Point source) const {
+  const WarpView warp = Warp();
+  const double u = source.x / (clip_->source_width - 1.0) * (clip_->columns - 1);
+  const double v = source.y / (clip_->source_height - 1.0) * (clip_->rows - 1);
+  const int c = static_cast<int>(std::clamp(u, 0.0, clip_->columns - 2.0));
+  const int r = static_cast<int>(std::clamp(v, 0.0, clip_->rows - 2.0));
   const double fx = u - c, fy = v - r;
   const auto mix = [&](double Point::*axis) {
     return (warp.at(c, r).*axis * (1 - fx) + warp.at(c + 1, r).*axis * fx) * (1 - fy) +
@@ -38,13 +48,13 @@ Point WarpedPlane::At(std::size_t frame, Point source) const {
 }
 
 // Newton's method; from cell to cell the slope hardly changes.
-Point WarpedPlane::SourceAt(std::size_t frame, Point plane) const {
+Point PlaneFrame::SourceAt(Point plane) const {
   constexpr int kMostSteps = 30;
   constexpr double kNear = 1e-3;  // pixels
-  Point source{(clip_.source_width - 1) / 2.0, (clip_.source_height - 1) / 2.0};
+  Point source{(clip_->source_width - 1) / 2.0, (clip_->source_height - 1) / 2.0};
   for (int step = 0; step < kMostSteps; ++step) {
-    const Point at = At(frame, source), right = At(frame, {source.x + 1, source.y}),
-                down = At(frame, {source.x, source.y + 1});
+    const Point at = At(source), right = At({source.x + 1, source.y}),
+                down = At({source.x, source.y + 1});
     const double xx = right.x - at.x, yx = right.y - at.y;
     const double xy = down.x - at.x, yy = down.y - at.y;
     const double determinant = xx * yy - xy * yx;
@@ -59,8 +69,8 @@ Point WarpedPlane::SourceAt(std::size_t frame, Point plane) const {
   return {kNone, kNone};
 }
 
-double WarpedPlane::Scale(std::size_t frame) const {
-  const WarpView warp = Warp(frame);
+double PlaneFrame::Scale() const {
+  const WarpView warp = Warp();
   double twice = 0;
   const auto add = [&](const Point& p, const Point& q) { twice += p.x * q.y - q.x * p.y; };
   for (int c = 0; c + 1 < warp.columns; ++c) {
@@ -71,7 +81,7 @@ double WarpedPlane::Scale(std::size_t frame) const {
     add(warp.at(warp.columns - 1, r), warp.at(warp.columns - 1, r + 1));
     add(warp.at(0, r + 1), warp.at(0, r));
   }
-  const double area = (clip_.width - 1.0) * (clip_.height - 1.0);
+  const double area = (clip_->width - 1.0) * (clip_->height - 1.0);
   return std::sqrt(std::max(twice / 2 / area, 0.0));
 }
 

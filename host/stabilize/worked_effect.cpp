@@ -44,7 +44,7 @@ HostSettings SettingsFor(const media::ClipInfo& info) {
   settings.media.cache_bytes =
       kFrames * static_cast<std::size_t>(info.width) * static_cast<std::size_t>(info.height) * 4;
   // Of what is saved time and again while a clip is worked, a project alone is to be small.
-  settings.keeps_analysis_raw = true;
+  settings.saves_as = PayloadForm::packed;
   return settings;
 }
 
@@ -145,8 +145,7 @@ void WorkedEffect::EndWithShot() {
 }
 
 void WorkedEffect::TakeAsSaved() {
-  SavedEffect saved;
-  const CommandResult result = effect_->Save(&saved);
+  const CommandResult result = effect_->Save(nullptr);
   if (!result.ok()) throw SolveFailure(result.Line(path()));
 }
 
@@ -196,6 +195,7 @@ void WorkedEffect::Settle(Watcher& watcher, Progress& shown, Reuse& reuse) {
       break;
     }
     TakeAsSaved();  // ahead of what is solved of them
+    GiveBack();
     analysed_ = false;
   }
   // The render that follows has its own pattern of buffers: what the analysis took goes back.
@@ -339,10 +339,11 @@ SolvedClip WorkedEffect::Solved(SavedEffect* saved) {
 }
 
 SolvedClip WorkedEffect::SolvedBy(Effect& effect, SavedEffect* saved, const std::string& name) {
-  const CommandResult result = effect.Save(saved);
+  SavedEffect unwanted;
+  const CommandResult result = effect.Save(saved ? saved : &unwanted);
   if (!result.ok()) throw SolveFailure(result.Line(name));
   try {
-    return ReadSolvedClip(saved->instance);
+    return ReadSolvedClip(saved ? saved->instance : std::move(unwanted.instance));
   } catch (const NoSolvedClip& failure) {
     throw SolveFailure(name + ": " + failure.what());
   }
@@ -350,14 +351,19 @@ SolvedClip WorkedEffect::SolvedBy(Effect& effect, SavedEffect* saved, const std:
 
 SavedShot WorkedEffect::Saved() {
   SavedShot shot;
-  host_.KeepAnalysisRaw(false);
+  host_.SaveAs(PayloadForm::deflated);
   const CommandResult saved = effect_->Save(&shot.effect);
-  host_.KeepAnalysisRaw(true);
+  host_.SaveAs(PayloadForm::packed);
   if (!saved.ok()) throw SolveFailure(saved.Line(path()));
   const auto layer = effect_->shared()->layer()->state();
   shot.start_frame = layer->start_frame;
   shot.length = layer->length;
   return shot;
+}
+
+void WorkedEffect::GiveBack() const {
+  constexpr std::size_t kLeast = 500;  // frames
+  if (range_.size() >= kLeast) malloc_trim(0);
 }
 
 boost::shared_ptr<Layer> WorkedEffect::LayerOfItsOwn() const {
@@ -393,13 +399,14 @@ const std::set<TrackPoint>& WorkedEffect::DeletedTracks() {
   if (knows_deleted_) return deleted_;
   knows_deleted_ = true;
   try {
-    SavedEffect saved;
-    const SolvedClip solved = Solved(&saved);
-    for (std::size_t i = 0; i < solved.statuses.size(); ++i) {
-      if (solved.statuses[i] != kDeletedTrackBegins) continue;
-      const auto slots = static_cast<std::size_t>(solved.slots);
-      deleted_.insert({solved.first_frame + static_cast<std::int32_t>(i / slots),
-                       static_cast<std::int32_t>(i % slots)});
+    const SolvedClip solved = Solved(nullptr);
+    for (std::int32_t row = 0; row < solved.frame_count; ++row) {
+      const TrackRow tracks = solved.TracksOf(static_cast<std::size_t>(row));
+      for (std::int32_t slot = 0; slot < solved.slots; ++slot) {
+        if (tracks.statuses[static_cast<std::size_t>(slot)] == kDeletedTrackBegins) {
+          deleted_.insert({solved.first_frame + row, slot});
+        }
+      }
     }
   } catch (const SolveFailure&) {  // nothing is solved, and nothing deleted
   }

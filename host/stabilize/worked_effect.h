@@ -84,7 +84,8 @@ class WorkedEffect {
     knows_deleted_ = true;
   }
 
-  // What the effect would save, and what of it is solved. Throws SolveFailure.
+  // What the effect would save, null where nobody wants it, and what of it is solved. Throws
+  // SolveFailure.
   SolvedClip Solved(SavedEffect* saved);
   // The same of any effect; `name` stands ahead of what it throws.
   static SolvedClip SolvedBy(Effect& effect, SavedEffect* saved, const std::string& name);
@@ -93,6 +94,10 @@ class WorkedEffect {
   void CheckReady(const Effect& effect, const std::vector<std::string>& messages = {}) const;
   // As projects keep it. Throws SolveFailure where it can't be saved.
   SavedShot Saved();
+
+  // What was freed of the clip in small pieces goes back to the system. Else it would stand beside
+  // what the next step takes. Of short ones it is not worth the time.
+  void GiveBack() const;
 
   // For another effect on the same frames.
   boost::shared_ptr<Layer> LayerOfItsOwn() const;

@@ -269,18 +269,35 @@ void CPWarper::drive(const progress_functor& progress) {
   driven_ = true;
 }
 
+boost::shared_ptr<const CPWarper> CPWarper::withoutTracks() const {
+  const boost::shared_ptr<CPWarper> warper(new CPWarper(*this));
+  warper->global_.reset();
+  warper->tracks_.reset();
+  warper->modelScore_ = {};
+  warper->bases_ = {};
+  warper->driven_ = false;
+  return warper;
+}
+
 void CPWarper::storeFrameWarp(const VarVector& record) {
-  append(quantise(record), record.cols, record.rows);
+  const quantised_warp quantised = quantise(record);
+  append(pack(quantised, record.cols), quantised, record.cols, record.rows);
 }
 
 void CPWarper::storeFrameWarp(const quantised_warp& record) {
-  append(record, grid_.cols, grid_.rows);
+  append(pack(record, grid_.cols), record, grid_.cols, grid_.rows);
 }
 
-void CPWarper::append(const quantised_warp& record, std::int32_t cols, std::int32_t rows) {
+void CPWarper::storeFrameWarp(packed_warp record) {
+  const quantised_warp quantised = unpack(record, grid_.cols, grid_.rows);
+  append(std::move(record), quantised, grid_.cols, grid_.rows);
+}
+
+void CPWarper::append(packed_warp packed, const quantised_warp& record, std::int32_t cols,
+                      std::int32_t rows) {
   auto expanded = boost::make_shared<const VarVector>(rebuild(record, cols, rows));
   const frame_bounds bounds = outline_bounds(*expanded);
-  frameWarps_->push_back({pack(record, cols, rows), cols, rows, bounds});
+  frameWarps_->push_back({std::move(packed), cols, rows, bounds});
   if (!firstWarp_) firstWarp_ = std::move(expanded);
   unionBounds_.min_x = std::min(unionBounds_.min_x, bounds.min_x);
   unionBounds_.min_y = std::min(unionBounds_.min_y, bounds.min_y);

@@ -78,6 +78,9 @@ class CPWarper {
   // warper that was read from a project knows no tracks: it keeps the map it has.
   boost::shared_ptr<CPWarper> withFrameMap(
       std::uint32_t radius, const progress_functor& progress = [] {}) const;
+  // The same warps and map as a project brings them back, without what they were made from, which
+  // takes several times their memory.
+  boost::shared_ptr<const CPWarper> withoutTracks() const;
   const boost::shared_ptr<const MtoNMap>& frameMap() const { return frameMap_; }
   void setFrameMap(boost::shared_ptr<const MtoNMap> map) { frameMap_ = std::move(map); }
 
@@ -105,13 +108,15 @@ class CPWarper {
 
   // Appends a record, which is rounded to 1/256 pixel about its corners' plane.
   void storeFrameWarp(const VarVector& record);
-  // Appends exactly this one.
+  // Appends exactly this one. Throws std::invalid_argument where a packed one's bytes are none.
   void storeFrameWarp(const quantised_warp& record);
+  void storeFrameWarp(packed_warp record);
   // Records are kept packed and expanded for who asks; that of frame 0 is kept, so that its address
   // tells one solve from the next. Throws std::out_of_range "invalid vector<T> subscript" at or
   // past the end. Any thread.
   boost::shared_ptr<const VarVector> frameWarp(std::size_t frame) const;
   quantised_warp storedWarp(std::size_t frame) const;
+  const packed_warp& packedWarp(std::size_t frame) const { return frameWarps_->at(frame).warp; }
   std::size_t frameWarpCount() const { return frameWarps_->size(); }
 
   // Of the frame's outer ring of vertices. A maximum is at least the smallest normal 32-bit float,
@@ -138,7 +143,8 @@ class CPWarper {
   static void checkConsistency(std::size_t frame, const std::vector<Displacement>& list,
                                const matrix3& stored);
   matrix3 storedSimilarity(std::size_t frame) const;
-  void append(const quantised_warp& record, std::int32_t cols, std::int32_t rows);
+  void append(packed_warp packed, const quantised_warp& record, std::int32_t cols,
+              std::int32_t rows);
 
   frame_model chooseModel(std::size_t frame, const std::vector<Displacement>& list);
   matrix3 fitKind(std::size_t frame, const std::vector<Displacement>& list, int kind);

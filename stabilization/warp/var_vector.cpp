@@ -4,7 +4,7 @@
 #include <cmath>
 #include <stdexcept>
 
-#include "platform/memory/packed_words.h"
+#include "platform/memory/packed_grid.h"
 
 namespace marrow::stabilization {
 namespace {
@@ -69,41 +69,9 @@ VarVector rebuild(const quantised_warp& quantised, std::int32_t cols, std::int32
   return record;
 }
 
-namespace {
-
-// Calls visit(i, expected) for each offset of one coordinate, row by row; `expected` reads what
-// visit left in `offsets`.
-template <class Visit>
-void for_each_expected(const std::vector<std::int32_t>& offsets, std::size_t coordinate,
-                       std::int32_t cols, std::int32_t rows, Visit visit) {
-  const auto at = [&](std::size_t i) { return static_cast<std::uint32_t>(offsets[i]); };
-  const std::size_t row = 2 * static_cast<std::size_t>(cols);
-  std::size_t i = coordinate;
-  for (std::int32_t r = 0; r < rows; ++r) {
-    for (std::int32_t c = 0; c < cols; ++c, i += 2) {
-      std::uint32_t expected = 0;
-      if (c > 0) expected += at(i - 2);
-      if (r > 0) expected += at(i - row);
-      if (c > 0 && r > 0) expected -= at(i - row - 2);
-      visit(i, expected);
-    }
-  }
-}
-
-}  // namespace
-
-packed_warp pack(const quantised_warp& quantised, std::int32_t cols, std::int32_t rows) {
+packed_warp pack(const quantised_warp& quantised, std::int32_t cols) {
   packed_warp packed{quantised.corners, {}};
-  std::vector<std::int32_t> residuals;
-  residuals.reserve(quantised.offsets.size());
-  for (const std::size_t coordinate : {0, 1}) {
-    for_each_expected(quantised.offsets, coordinate, cols, rows,
-                      [&](std::size_t i, std::uint32_t expected) {
-                        residuals.push_back(static_cast<std::int32_t>(
-                            static_cast<std::uint32_t>(quantised.offsets[i]) - expected));
-                      });
-  }
-  memory::PackWords(residuals, packed.offsets);
+  memory::PackGrid(quantised.offsets, static_cast<std::size_t>(cols), packed.offsets);
   packed.offsets.shrink_to_fit();
   return packed;
 }
@@ -112,18 +80,8 @@ quantised_warp unpack(const packed_warp& packed, std::int32_t cols, std::int32_t
   quantised_warp quantised;
   quantised.corners = packed.corners;
   quantised.offsets.resize(2 * static_cast<std::size_t>(cols) * static_cast<std::size_t>(rows));
-  std::vector<std::int32_t> residuals(quantised.offsets.size());
-  std::size_t place = 0;
-  if (!memory::UnpackWords(packed.offsets, place, residuals) || place != packed.offsets.size()) {
+  if (!memory::UnpackGrid(packed.offsets, static_cast<std::size_t>(cols), quantised.offsets)) {
     throw std::invalid_argument("a packed warp's bytes are none");
-  }
-  std::size_t next = 0;
-  for (const std::size_t coordinate : {0, 1}) {
-    for_each_expected(
-        quantised.offsets, coordinate, cols, rows, [&](std::size_t i, std::uint32_t expected) {
-          quantised.offsets[i] =
-              static_cast<std::int32_t>(static_cast<std::uint32_t>(residuals[next++]) + expected);
-        });
   }
   return quantised;
 }

@@ -50,13 +50,11 @@ VarVector rebuild(const quantised_warp& quantised, std::int32_t cols, std::int32
 // The same in some 2 KB in place of 37: the offsets of neighbouring vertices differ little.
 struct packed_warp {
   std::array<point2, 4> corners = {};
-  std::vector<std::uint8_t> offsets;  // see pack
+  std::vector<std::uint8_t> offsets;  // by memory::PackGrid
 };
 
-// offsets of `quantised`: cols * rows pairs. What is packed are the x of all vertices, then their
-// y, row-major, each less what a plane through its neighbours left, above and above left has there
-// (0 outside of the grid), modulo 2^32, by memory::PackWords.
-packed_warp pack(const quantised_warp& quantised, std::int32_t cols, std::int32_t rows);
+// offsets of `quantised`: rows of cols pairs.
+packed_warp pack(const quantised_warp& quantised, std::int32_t cols);
 // Throws std::invalid_argument where the bytes are none that pack makes.
 quantised_warp unpack(const packed_warp& packed, std::int32_t cols, std::int32_t rows);
 

@@ -29,13 +29,14 @@ std::vector<LassoedTrack> TracksIn(const Lasso& lasso, const host::SolvedClip& c
   std::vector<LassoedTrack> found;
   std::vector<char> is_found(static_cast<std::size_t>(clip.slots), 0);  // a slot's track
   for (std::int64_t r = first; r < end; ++r) {
+    const host::TrackRow tracks = clip.TracksOf(static_cast<std::size_t>(r));
     for (int slot = 0; slot < clip.slots; ++slot) {
-      const auto cell = static_cast<std::size_t>(r * clip.slots + slot);
-      char& is_known = is_found[static_cast<std::size_t>(slot)];
-      if (clip.statuses[cell] > 0) is_known = 0;  // another one begins
-      if (clip.statuses[cell] < 0 || is_known) continue;
-      const host::Point place{(clip.tracks[cell].x + 0.5) / clip.source_width,
-                              (clip.tracks[cell].y + 0.5) / clip.source_height};
+      const auto cell = static_cast<std::size_t>(slot);
+      char& is_known = is_found[cell];
+      if (tracks.statuses[cell] > 0) is_known = 0;  // another one begins
+      if (tracks.statuses[cell] < 0 || is_known) continue;
+      const host::Point place{(tracks.places[cell].x + 0.5) / clip.source_width,
+                              (tracks.places[cell].y + 0.5) / clip.source_height};
       if (!IsInside(lasso.corners, place)) continue;
       is_known = 1;
       found.push_back({{static_cast<std::int32_t>(clip.first_frame + r), slot}, place});

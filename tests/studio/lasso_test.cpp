@@ -4,6 +4,8 @@
 
 #include <vector>
 
+#include "tests/support/given_frames.h"
+
 namespace calmframe::studio {
 namespace {
 
@@ -21,9 +23,10 @@ host::SolvedClip Tracked() {
   clip.first_frame = 10;
   clip.frame_count = 4;
   clip.slots = 3;
-  clip.statuses = {1, 1, -10, 0, 0, -11, 0, 3, -1, 0, 0, -1};
-  clip.tracks = {{9.5, 4.5},  {49.5, 24.5}, {49.5, 24.5}, {29.5, 4.5}, {49.5, 24.5}, {49.5, 24.5},
-                 {49.5, 4.5}, {8.5, 8.5},   {},           {69.5, 4.5}, {8.5, 8.5},   {}};
+  host::GivenFrames& given = host::GivenFrames::In(clip);
+  given.statuses = {1, 1, -10, 0, 0, -11, 0, 3, -1, 0, 0, -1};
+  given.tracks = {{9.5, 4.5},  {49.5, 24.5}, {49.5, 24.5}, {29.5, 4.5}, {49.5, 24.5}, {49.5, 24.5},
+                  {49.5, 4.5}, {8.5, 8.5},   {},           {69.5, 4.5}, {8.5, 8.5},   {}};
   return clip;
 }
 

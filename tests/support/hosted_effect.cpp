@@ -50,7 +50,7 @@ HostedEffect::HostedEffect(const HostedSettings& settings) {
   keeps_deletions = settings.keeps_deletions;
   HostSettings host;
   host.media.cache_bytes = std::size_t{16} << 20;
-  host.keeps_analysis_raw = settings.keeps_analysis_raw;
+  host.saves_as = settings.saves_as;
   host_ = std::make_unique<Host>(LinkedPlugin(Entry), host);
   host_->handles().MoveOnUnlock(true);
   host_->worlds().SetRowPadding(16);
@@ -225,7 +225,7 @@ SavedEffect HostedEffect::Altered(const SavedEffect& saved,
   std::memcpy(&header, saved.instance.data(), sizeof header);
   const SourceInfo& source = layer_->state()->source->info();
   SavedState state = kelp::effect::ReadState(
-      saved.instance.data() + sizeof header, header.payload_length, header.version, header.raw != 0,
+      saved.instance.data() + sizeof header, header.payload_length, header.version, header.raw,
       {source.width, source.height, source.pixel_aspect.num, source.pixel_aspect.den});
   change(state);
   tessel::filesupport::OStringByteStream bytes;

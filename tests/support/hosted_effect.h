@@ -27,7 +27,7 @@ class StabilizerEffect;
 namespace calmframe::host {
 
 struct HostedSettings {
-  bool keeps_analysis_raw = false;  // saved payloads are not deflated
+  calmframe::host::PayloadForm saves_as = calmframe::host::PayloadForm::deflated;
   // The host has a parameter, behind the effect's own, for the track points that the user deleted.
   bool keeps_deletions = false;
 };

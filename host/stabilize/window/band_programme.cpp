@@ -13,16 +13,6 @@ constexpr int kMostSteps = 80;
 constexpr double kGap = 1e-7;       // of a complementary pair, in the charges' unit
 constexpr double kTowards = 0.995;  // of the way to the next bound that a step may go
 
-double Dot(const BandRow& row, const std::vector<double>& z) {
-  double sum = 0;
-  for (int i = 0; i < row.count; ++i) sum += row.coefficients[i] * z[row.first + i];
-  return sum;
-}
-
-void AddTo(std::vector<double>& z, const BandRow& row, double factor) {
-  for (int i = 0; i < row.count; ++i) z[row.first + i] += factor * row.coefficients[i];
-}
-
 // Symmetric positive definite, lower triangle by columns. Its own Cholesky factorization (Golub and
 // Van Loan, Matrix Computations, 4th ed., 4.3.5): a BLAS takes more memory when it is loaded than
 // all else that a program has before its first clip.
@@ -36,12 +26,12 @@ class BandMatrix {
       column[0] = diagonal;
     }
   }
-  void AddSquare(const BandRow& row, double weight) {
+  void AddSquare(const BandRow& row, const double* coefficients, double weight) {
     for (int j = 0; j < row.count; ++j) {
-      const double factor = weight * row.coefficients[j];
+      const double factor = weight * coefficients[j];
       if (factor == 0) continue;
       Column& column = columns_[row.first + j];
-      for (int i = j; i < row.count; ++i) column[i - j] += factor * row.coefficients[i];
+      for (int i = j; i < row.count; ++i) column[i - j] += factor * coefficients[i];
     }
   }
   // Destroys the matrix. False where it is not positive definite in this precision.
@@ -139,6 +129,16 @@ class InteriorPoint {
   }
 
  private:
+  double Dot(const BandRow& row, const std::vector<double>& z) const {
+    const double* const coefficients = p_.Of(row);
+    double sum = 0;
+    for (int i = 0; i < row.count; ++i) sum += coefficients[i] * z[row.first + i];
+    return sum;
+  }
+  void AddTo(std::vector<double>& z, const BandRow& row, double factor) const {
+    const double* const coefficients = p_.Of(row);
+    for (int i = 0; i < row.count; ++i) z[row.first + i] += factor * coefficients[i];
+  }
   double Residual(std::size_t i) const { return Dot(p_.charges[i].row, z_) - p_.charges[i].target; }
 
   template <class Visit>
@@ -189,10 +189,12 @@ class InteriorPoint {
     matrix_.Clear(p_.tether);
     for (std::size_t i = 0; i < size_.size(); ++i) {
       const double up = above_[i].ratio(), down = below_[i].ratio();
-      matrix_.AddSquare(p_.charges[i].row, 4 * up * down / (up + down));
+      const BandRow& row = p_.charges[i].row;
+      matrix_.AddSquare(row, p_.Of(row), 4 * up * down / (up + down));
     }
     for (std::size_t j = 0; j < bounds_.size(); ++j) {
-      matrix_.AddSquare(p_.limits[j].row, bounds_[j].ratio());
+      const BandRow& row = p_.limits[j].row;
+      matrix_.AddSquare(row, p_.Of(row), bounds_[j].ratio());
     }
     return matrix_.Factorize();
   }

@@ -1,16 +1,16 @@
 #pragma once
 
-#include <array>
 #include <cstddef>
 #include <vector>
 
 namespace calmframe::host {
 
-// A row of a band matrix: coefficients of neighbouring unknowns, from `first` on.
+// A row of a band matrix: coefficients of neighbouring unknowns, from `first` on, which its
+// programme has from `place` on. Most rows are short, and there are some thirty a frame.
 struct BandRow {
   static constexpr int kMost = 16;
   int first = 0, count = 0;
-  std::array<double, kMost> coefficients{};
+  std::size_t place = 0;
 };
 
 // Minimise  linear' z + tether/2 |z|^2 + sum_i weight_i |(row_i z) - target_i|
@@ -29,6 +29,16 @@ struct BandProgramme {
   double tether = 0;           // keeps what nothing else decides near 0
   std::vector<Charge> charges;
   std::vector<Limit> limits;
+  std::vector<double> coefficients;  // of all rows
+
+  // Of zeros.
+  BandRow AddRow(int first, int count) {
+    const std::size_t place = coefficients.size();
+    coefficients.resize(place + static_cast<std::size_t>(count));
+    return {first, count, place};
+  }
+  double* Of(const BandRow& row) { return coefficients.data() + row.place; }
+  const double* Of(const BandRow& row) const { return coefficients.data() + row.place; }
 };
 
 // A primal-dual interior point method with Mehrotra's predictor and corrector (Nocedal and Wright,

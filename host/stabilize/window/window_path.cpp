@@ -57,13 +57,14 @@ class WindowProgramme {
     programme.linear.assign(static_cast<std::size_t>(programme.unknowns), 0.0);
     programme.tether = 1e-9;
     const auto add = [&](std::size_t f, const Terms& terms, double limit) {
-      BandProgramme::Limit added;
-      added.row.first = IndexOf(f, 0);
-      added.row.count = kUnknowns;
-      std::copy(terms.begin(), terms.end(), added.row.coefficients.begin());
-      added.limit = limit - kInside;
-      programme.limits.push_back(added);
+      const BandRow row = programme.AddRow(IndexOf(f, 0), kUnknowns);
+      std::copy(terms.begin(), terms.end(), programme.Of(row));
+      programme.limits.push_back({row, limit - kInside});
     };
+    std::size_t limits = 0;
+    for (const WindowFrame& frame : frames_) limits += 4 * frame.covered.size() + 3;
+    programme.limits.reserve(limits);
+    programme.coefficients.reserve(limits * kUnknowns);
     for (std::size_t f = 0; f < frames_.size(); ++f) {
       for (const HalfPlane& side : frames_[f].covered) {
         for (const double x : {-kEdge, kEdge}) {
@@ -114,16 +115,20 @@ class WindowProgramme {
     // Binomial coefficients of the differences, first to third.
     constexpr double kDifferences[3][3] = {{1, 0, 0}, {-1, 1, 0}, {1, -2, 1}};
     const double weight_of[] = {weights.motion, weights.change, weights.jerk};
+    constexpr std::size_t kRows = 3 * kUnknowns + 2;  // of a frame, with those of its growth
+    constexpr std::size_t kCoefficients = ((2 + 3 + 4) * kUnknowns + 2 * 2) * kUnknowns;
+    programme.charges.reserve(frames_.size() * kRows);
+    programme.coefficients.reserve(programme.coefficients.size() + frames_.size() * kCoefficients);
     for (std::size_t order = 0; order < 3; ++order) {
       if (weight_of[order] <= 0) continue;
       for (std::size_t f = 0; f + order + 1 < frames_.size(); ++f) {
         for (int unknown = 0; unknown < kUnknowns; ++unknown) {
           BandProgramme::Charge charge;
-          charge.row.first = IndexOf(f, 0);
-          charge.row.count = static_cast<int>(order + 2) * kUnknowns;
+          charge.row = programme.AddRow(IndexOf(f, 0), static_cast<int>(order + 2) * kUnknowns);
           charge.weight = weight_of[order];
           for (std::size_t k = 0; k <= order; ++k) {
-            AddMotion(f + k, unknown, kDifferences[order][k], k * kUnknowns, charge);
+            AddMotion(f + k, unknown, kDifferences[order][k],
+                      programme.Of(charge.row) + k * kUnknowns, charge.target);
           }
           programme.charges.push_back(charge);
         }
@@ -139,16 +144,16 @@ class WindowProgramme {
       const auto add = [&](double growth, double sign) {
         if (!(growth > 0 && std::isfinite(growth))) return;
         BandProgramme::Charge charge;
-        charge.row.first = IndexOf(f, 0);
-        charge.row.count = 2 * kUnknowns;
-        charge.row.coefficients[kScale] = -sign / growth;
-        charge.row.coefficients[kUnknowns + kScale] = sign * next.motion.a;
-        charge.row.coefficients[kUnknowns + kTurn] = -sign * next.motion.b;
+        charge.row = programme.AddRow(IndexOf(f, 0), 2 * kUnknowns);
+        double* const coefficients = programme.Of(charge.row);
+        coefficients[kScale] = -sign / growth;
+        coefficients[kUnknowns + kScale] = sign * next.motion.a;
+        coefficients[kUnknowns + kTurn] = -sign * next.motion.b;
         charge.weight = weight / 2;
         programme.charges.push_back(charge);
         for (int i = 0; i < charge.row.count; ++i) {
           programme.linear[static_cast<std::size_t>(charge.row.first + i)] +=
-              charge.weight * charge.row.coefficients[i];
+              charge.weight * coefficients[i];
         }
       };
       add(next.least_growth, 1);
@@ -157,22 +162,21 @@ class WindowProgramme {
   }
 
   // What the output shows of the background's motion from the frame behind `f` to `f`, through the
-  // windows of both: motion[f + 1] window[f + 1] - window[f], in the plane.
-  void AddMotion(std::size_t f, int unknown, double factor, std::size_t at,
-                 BandProgramme::Charge& charge) const {
+  // windows of both: motion[f + 1] window[f + 1] - window[f], in the plane. `now`: coefficients of
+  // the unknowns of `f`, with those of the next frame behind them.
+  void AddMotion(std::size_t f, int unknown, double factor, double* now, double& target) const {
     const Similarity& motion = frames_[f + 1].motion;
-    double* const now = charge.row.coefficients.data() + at;
     double* const next = now + kUnknowns;
     now[unknown] -= factor;
     next[unknown] += factor * motion.a;
     switch (unknown) {
       case kShiftX:
         next[kShiftY] -= factor * motion.b;
-        charge.target -= factor * motion.dx / unit_;
+        target -= factor * motion.dx / unit_;
         break;
       case kShiftY:
         next[kShiftX] += factor * motion.b;
-        charge.target -= factor * motion.dy / unit_;
+        target -= factor * motion.dy / unit_;
         break;
       case kScale:
         next[kTurn] -= factor * motion.b;
@@ -189,11 +193,12 @@ class WindowProgramme {
     const std::vector<double> inside = Start(largest);
     std::vector<double> share(frames_.size(), 0.0);
     for (const BandProgramme::Limit& limit : programme.limits) {
+      const double* const coefficients = programme.Of(limit.row);
       double reached = 0, safe = 0;
       for (int i = 0; i < limit.row.count; ++i) {
         const auto k = static_cast<std::size_t>(limit.row.first + i);
-        reached += limit.row.coefficients[i] * found[k];
-        safe += limit.row.coefficients[i] * inside[k];
+        reached += coefficients[i] * found[k];
+        safe += coefficients[i] * inside[k];
       }
       const double most = limit.limit + kInside;
       if (reached <= most) continue;

@@ -203,8 +203,13 @@ void Solver::Core::RunFactorization() {
 void Solver::Core::MakeWarperUsingFactorization(CPWarper& newWarper) {
   const tessel::debug::TimingEntry timing(kChannel, kTimingLevel, "MakeWarperUsingFactorization()");
   const progress_functor poll = MakeProgressFunctor();
-  newWarper.buildDisplacements(globalData, factorizationWindows, transitionWindows,
-                               inputs.parameters, poll);
+  newWarper.buildDisplacements(std::exchange(globalData, {}), factorizationWindows,
+                               transitionWindows, inputs.parameters, poll);
+  // The warper has what it needs of them.
+  for (marrow::stabilization::factorization_window& window : factorizationWindows) {
+    window.overlap_rows = {};
+    window.coefficients = {};
+  }
   newWarper.drive([this, &poll, &newWarper] {
     poll();
     ReportShare(kFactorizationShare, kWarperShare, newWarper.frameWarpCount());

@@ -76,6 +76,7 @@ class Solver {
   // Results. To be read once the state is finished.
   const boost::shared_ptr<const marrow::stabilization::CPWarper>& GetWarper() const;
   const boost::shared_ptr<const cropper>& GetCropper() const;
+  // Without their coefficients and overlap rows.
   const std::vector<marrow::stabilization::factorization_window>& GetFactorizationWindows() const;
   const std::vector<marrow::stabilization::transition_record>& GetTransitionWindows() const;
 

@@ -212,6 +212,7 @@ void StabilizerEffect::FlattenInstance() {
     // Locked before anything changes. An analysis goes on without the state: whoever asks for the
     // same again finds its job.
     const InstanceHandleLock header(context(), live);
+    if (const StabilizerState* const state = GetState()) state->ForgetTracks();
     DetachSharedData();
     const std::unique_ptr<StabilizerState> state = header.TakeState();
   }

@@ -194,6 +194,16 @@ void StabilizerState::Publish(bool gpu_allowed) const {
   // What was published before goes here, without the lock.
 }
 
+void StabilizerState::ForgetTracks() const {
+  if (!shared || !solve_result->warper || !solve_result->warper->driven()) return;
+  boost::shared_ptr<const SolveResult> published = solve_result;
+  Replace(published, [](SolveResult& next) { next.warper = next.warper->withoutTracks(); });
+  const std::unique_lock<std::shared_mutex> lock(shared->lock);
+  if (shared->contents.solve_result == solve_result) {
+    std::swap(shared->contents.solve_result, published);
+  }
+}
+
 void StabilizerState::TakeOver() {
   if (!shared) return;
   StabilizerSharedData::Contents contents;

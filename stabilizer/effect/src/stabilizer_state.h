@@ -81,6 +81,9 @@ class StabilizerState final : public analysis::AnalysisState {
   // the track table and the analyzer of a user interface instance alone, so that neither a save nor
   // a poll loses them.
   void Publish(bool gpu_allowed) const;
+  // Of a state that goes, once it is saved: what renders share of its solve keeps no longer what
+  // the warps were made from.
+  void ForgetTracks() const;
   void TakeOver();
 
   // What a project keeps, and back into a fresh state. A Solver at work is left out: what it works

@@ -2,7 +2,6 @@
 
 #include <cmath>
 #include <cstring>
-#include <string>
 
 #include "analysis/host/video_segment_render_suite_job.h"
 #include "analysis/src/job_frame_source.h"
@@ -20,35 +19,61 @@ namespace kelp::effect {
 
 using analysis::AfterReport;
 using analysis::FrameStatus;
+using state_format::PayloadForm;
 
 namespace {
 
-bool KeepsPayloadRaw(const HostContext& context) {
+PayloadForm FormAskedFor(const HostContext& context) {
   using tessel::debug::DebugDatabase;
-  if (DebugDatabase::GetBool("AnalysisDataIsAlwaysCompressed")) return false;
-  if (DebugDatabase::GetBool("AnalysisDataIsNeverCompressed")) return true;
+  if (DebugDatabase::GetBool("AnalysisDataIsAlwaysCompressed")) return PayloadForm::deflated;
+  if (DebugDatabase::GetBool("AnalysisDataIsNeverCompressed")) return PayloadForm::raw;
   const ScopedSuite<HX_AnalysisHostSuite1> suite(context);
   std::uint8_t raw = 0;
   ThrowIfFailed(suite->GetCompressionPreference(&raw));
-  return raw != 0;
+  return state_format::FormOf(state_format::kPresentVersion, raw);
 }
 
-std::string PayloadOf(const StabilizerState& state, bool raw) {
-  tessel::filesupport::OStringByteStream bytes;
-  if (raw) {
-    WriteState(bytes, state.Save());
-  } else {
-    tessel::filesupport::OZipByteStream zip(bytes);
-    WriteState(zip, state.Save());
-    zip.Close();
+// Tells how much was written.
+class CountingStream final : public tessel::filesupport::OutputByteStream {
+ public:
+  void Write(const void*, std::size_t size) override { size_ += size; }
+  std::size_t size() const { return size_; }
+
+ private:
+  std::size_t size_ = 0;
+};
+
+// Into memory of a size that was counted before.
+class PlacedStream final : public tessel::filesupport::OutputByteStream {
+ public:
+  explicit PlacedStream(void* place) : next_(static_cast<char*>(place)) {}
+  void Write(const void* data, std::size_t size) override {
+    if (size > 0) std::memcpy(next_, data, size);
+    next_ += size;
   }
-  return bytes.Take();
+
+ private:
+  char* next_;
+};
+
+// A handle of a payload of that size, with its header; fill(the payload's place).
+template <class Fill>
+HX_Handle HandleOf(const HostContext& context, std::size_t size, PayloadForm form,
+                   const Fill& fill) {
+  OwnedHandle flat(*context.in->cb, NewInstanceHandle(context, size));
+  {
+    const InstanceHandleLock header(context, flat.get());
+    header->flattened = 1;
+    header->raw = static_cast<std::uint8_t>(form);
+    fill(&*header + 1);
+  }
+  return flat.release();
 }
 
 SavedState ReadPayload(const HostContext& context, HX_Handle handle) {
   const InstanceHandleLock header(context, handle);
   return ReadState(&*header + 1, static_cast<std::size_t>(header->payload_length), header->version,
-                   header->raw != 0, ShapeOf(*context.in));
+                   header->raw, ShapeOf(*context.in));
 }
 
 // Tells the user why a payload is not taken, and throws StateDeserializationFailed.
@@ -121,16 +146,26 @@ FrameStatus ToldStatus(double counter) {
 }  // namespace
 
 HX_Handle FlattenedHandle(const HostContext& context, const StabilizerState* state) {
-  const bool raw = KeepsPayloadRaw(context);
-  const std::string payload = state ? PayloadOf(*state, raw) : std::string();
-  OwnedHandle flat(*context.in->cb, NewInstanceHandle(context, payload.size()));
-  {
-    const InstanceHandleLock header(context, flat.get());
-    header->flattened = 1;
-    header->raw = raw ? 1 : 0;
-    std::memcpy(&*header + 1, payload.data(), payload.size());
+  const PayloadForm form = FormAskedFor(context);
+  if (!state) return HandleOf(context, 0, form, [](void*) {});
+  const SavedState saved = state->Save();
+  if (form == PayloadForm::deflated) {
+    tessel::filesupport::OStringByteStream bytes;
+    tessel::filesupport::OZipByteStream zip(bytes);
+    WriteState(zip, saved);
+    zip.Close();
+    return HandleOf(context, bytes.bytes().size(), form, [&bytes](void* payload) {
+      std::memcpy(payload, bytes.bytes().data(), bytes.bytes().size());
+    });
   }
-  return flat.release();
+  // Written twice, which is little work where all is kept as it is stored, so that a long clip's
+  // payload is in memory once.
+  CountingStream counted;
+  WriteState(counted, saved, form);
+  return HandleOf(context, counted.size(), form, [&](void* payload) {
+    PlacedStream placed(payload);
+    WriteState(placed, saved, form);
+  });
 }
 
 std::unique_ptr<StabilizerState> StateOfFlattened(const HostContext& context,

@@ -10,6 +10,8 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/given_frames.h"
+
 namespace calmframe::host {
 namespace {
 
@@ -27,6 +29,7 @@ SolvedClip Filmed(double noise, double growth = 1) {
   clip.columns = 5;
   clip.rows = 4;
   clip.slots = kSlots;
+  GivenFrames& given = GivenFrames::In(clip);
   std::vector<Point> scene;
   for (int s = 0; s < kSlots; ++s) {
     scene.push_back({200 + 180 * even(random), 150 + 130 * even(random)});
@@ -36,13 +39,13 @@ SolvedClip Filmed(double noise, double growth = 1) {
     const Similarity hand{near, 0.01 * even(random), 6 * even(random) + 200 * (1 - near),
                           6 * even(random) + 150 * (1 - near)};
     for (const Point& point : scene) {
-      clip.tracks.push_back(hand(point));
-      clip.statuses.push_back(f == 0 ? 1 : 0);
+      given.tracks.push_back(hand(point));
+      given.statuses.push_back(f == 0 ? 1 : 0);
     }
     for (int r = 0; r < clip.rows; ++r) {
       for (int c = 0; c < clip.columns; ++c) {
         const Point still = Inverse(hand)({399.0 * c / 4, 299.0 * r / 3});
-        clip.vertices.push_back({still.x + noise * even(random), still.y + noise * even(random)});
+        given.vertices.push_back({still.x + noise * even(random), still.y + noise * even(random)});
       }
     }
   }
@@ -57,7 +60,7 @@ Choice Best(const SolvedClip& clip, const std::vector<Candidate>& candidates,
             const FollowSettings& settings = {}) {
   Chooser chooser(clip, settings);
   for (const Candidate& candidate : candidates) chooser.Consider(candidate, clip);
-  if (settings.enlarged == 1) chooser.ConsiderAsFilmed(clip);
+  if (settings.enlarged == 1) chooser.ConsiderAsFilmed();
   EXPECT_EQ(chooser.windows().size(), 90u);
   return chooser.choice();
 }
@@ -83,8 +86,9 @@ TEST(ChooserTest, BendsAreKeptWhereTheyHelpAndLeftWhereTheyAreNoise) {
 // What nothing steadies is better not touched.
 TEST(ChooserTest, WhatIsNoBetterThanTheSourceIsLeftAsItIs) {
   SolvedClip still = Filmed(15);
+  GivenFrames& given = GivenFrames::In(still);
   for (int f = 1; f < still.frame_count; ++f) {  // a tripod's tracks under the shaking hand's warps
-    std::copy_n(still.tracks.begin(), still.slots, still.tracks.begin() + f * still.slots);
+    std::copy_n(given.tracks.begin(), still.slots, given.tracks.begin() + f * still.slots);
   }
   const Choice choice = Best(still, {kBent});
   EXPECT_EQ(choice.best().name, "as filmed");

@@ -4,6 +4,8 @@
 
 #include <vector>
 
+#include "tests/support/given_frames.h"
+
 namespace calmframe::host {
 namespace {
 
@@ -17,13 +19,14 @@ SolvedClip Panned(const std::vector<double>& off) {
   clip.frame_count = 4;
   clip.columns = clip.rows = 2;
   clip.slots = 30;
+  GivenFrames& given = GivenFrames::In(clip);
   for (int f = 0; f < clip.frame_count; ++f) {
-    for (const Point& corner : GridAtRest(clip)) clip.vertices.push_back(corner);
+    for (const Point& corner : GridAtRest(clip)) given.vertices.push_back(corner);
     for (int s = 0; s < clip.slots; ++s) {
       const double x = 20 + s / 5 * 72, y = 90 + s % 5 * 30;
-      clip.tracks.push_back({x + 30 * (2 - f) + (x < 140 ? off[f] : 0), y});
+      given.tracks.push_back({x + 30 * (2 - f) + (x < 140 ? off[f] : 0), y});
       const bool deleted = x < 140;
-      clip.statuses.push_back(f == 0 ? (deleted ? -10 : 1) : (deleted ? -11 : 0));
+      given.statuses.push_back(f == 0 ? (deleted ? -10 : 1) : (deleted ? -11 : 0));
     }
     if (f != 2) clip.neighbours.push_back({f, 2, {1, 0, 30.0 * (f - 2), 0, 1, 0, 0, 0, 1}});
   }

@@ -9,6 +9,7 @@
 #include "host/stabilize/failures.h"
 #include "platform/hx/hx_controls.h"
 #include "tests/support/drawn_clip.h"
+#include "tests/support/given_frames.h"
 #include "tests/support/scratch_folder.h"
 
 namespace calmframe::host {
@@ -67,7 +68,8 @@ class FilmTest : public testing::Test {
     std::vector<Worked> shots;
     while (SteadyClip* const shot = film.Next()) {
       shot->Work(watcher_);
-      shots.push_back({shot->range().first, shot->range().end, shot->Solved().vertices});
+      shots.push_back(
+          {shot->range().first, shot->range().end, GivenFrames::Of(shot->Solved()).vertices});
       film.Keep();
     }
     return shots;

@@ -62,13 +62,19 @@ TEST(MeasureShakeTest, TurnsAndZoomsAreShakeToo) {
 // track's ends, don't.
 TEST(MeasureTrackShakeTest, TakesTheMedianOfTracksThatLast) {
   ShownMotion shown{kWidth, 300, std::vector<Similarity>(300), {}, {}, {}, {}, {}};
+  std::vector<TrackPath> paths;
   for (const double height : {1.0, 4.0, 50.0}) {
     TrackPath path{40, {}};
     for (int i = 0; i < 200; ++i) path.points.push_back({3.0 * i, height * Wave(11.3, i / kRate)});
-    shown.paths.push_back(path);
+    paths.push_back(path);
   }
+  shown.paths = std::make_shared<const std::vector<TrackPath>>(paths);
   EXPECT_NEAR(MeasureTrackShake(shown, kRate), 8 * 2 / std::numbers::pi, 0.25);
-  for (TrackPath& path : shown.paths) path.points.resize(36);  // 0.6 s to both sides are 37
+  // What takes them all to the output, twice as large.
+  shown.to_output.assign(300, Similarity{2, 0, 7, 0});
+  EXPECT_NEAR(MeasureTrackShake(shown, kRate), 2 * 8 * 2 / std::numbers::pi, 0.5);
+  for (TrackPath& path : paths) path.points.resize(36);  // 0.6 s to both sides are 37
+  shown.paths = std::make_shared<const std::vector<TrackPath>>(paths);
   EXPECT_EQ(MeasureTrackShake(shown, kRate), 0);
 }
 

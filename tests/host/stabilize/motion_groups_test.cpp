@@ -5,6 +5,7 @@
 
 #include "platform/tessel/threads.h"
 #include "tests/contract/played_plugin.h"
+#include "tests/support/given_frames.h"
 
 namespace calmframe::host {
 namespace {
@@ -87,7 +88,7 @@ TEST_F(MotionGroupsTest, WhoMovesByThemselvesIsTheSubject) {
     }
     int seen[2] = {}, right[2] = {};  // of the background, of the subject
     for (const GroupedTrack& track : groups.tracks) {
-      const Point at = clip.tracks[track.row * clip.slots + track.slot];
+      const Point at = clip.TracksOf(track.row).places[track.slot];
       const double depth = c.width > 0 ? c.Depth(clip.first_frame + track.row, at.x, at.y) : -99;
       // Windows on the outline see both.
       if (std::abs(depth) < 10 || track.group == MotionGroup::unsure) continue;
@@ -122,10 +123,11 @@ TEST_F(MotionGroupsTest, DeletedTracksAreLeftOutUntilTheyComeBack) {
   EXPECT_EQ(Settle(effect), kReady);
   const SavedEffect saved = Saved(effect);
   const SolvedClip without = ReadSolvedClip(saved.instance);
-  EXPECT_FALSE(without.vertices == all.vertices);
+  const GivenFrames frames = GivenFrames::Of(without), all_frames = GivenFrames::Of(all);
+  EXPECT_FALSE(frames.vertices == all_frames.vertices);
   std::size_t deleted = 0;
   for (const GroupedTrack& track : groups.tracks) {
-    const std::int32_t status = without.statuses[track.row * all.slots + track.slot];
+    const std::int32_t status = frames.statuses[track.row * all.slots + track.slot];
     EXPECT_EQ(status == kDeletedBegins, track.group == MotionGroup::subject);
     deleted += status == kDeletedBegins;
   }
@@ -140,12 +142,12 @@ TEST_F(MotionGroupsTest, DeletedTracksAreLeftOutUntilTheyComeBack) {
   EXPECT_TRUE(loaded.DeleteTracks(points).ok());
   EXPECT_EQ(Settle(loaded), kReady);
   EXPECT_EQ(*ValueOf(*loaded.Param(kStatusCounter)), told) << "they were deleted already";
-  EXPECT_TRUE(ClipOf(loaded).vertices == without.vertices);
+  EXPECT_TRUE(GivenFrames::Of(ClipOf(loaded)).vertices == frames.vertices);
   for (Effect* each : {&effect, &loaded}) {
     EXPECT_TRUE(each->DeleteTracks({}).ok());
     EXPECT_EQ(Settle(*each), kReady);
-    const SolvedClip back = ClipOf(*each);
-    EXPECT_TRUE(back.vertices == all.vertices);
+    const GivenFrames back = GivenFrames::Of(ClipOf(*each));
+    EXPECT_TRUE(back.vertices == all_frames.vertices);
     EXPECT_EQ(std::count(back.statuses.begin(), back.statuses.end(), kDeletedBegins), 0);
   }
   EXPECT_EQ(Analysed(), analysed);
@@ -153,7 +155,7 @@ TEST_F(MotionGroupsTest, DeletedTracksAreLeftOutUntilTheyComeBack) {
   EXPECT_TRUE(effect.DeleteTracks(points).ok());
   effect.SetParam(kDetailedAnalysis, 1);
   EXPECT_EQ(Settle(effect), kReady);
-  const SolvedClip anew = ClipOf(effect);
+  const GivenFrames anew = GivenFrames::Of(ClipOf(effect));
   EXPECT_EQ(std::count(anew.statuses.begin(), anew.statuses.end(), kDeletedBegins), 0);
 }
 
@@ -165,10 +167,11 @@ SolvedClip Drawn(int frames, const At& at) {
   clip.source_height = clip.height = kDown;
   clip.frame_count = frames;
   clip.slots = 40;
+  GivenFrames& given = GivenFrames::In(clip);
   for (int row = 0; row < frames; ++row) {
     for (int slot = 0; slot < clip.slots; ++slot) {
-      clip.tracks.push_back(at(row, slot));
-      clip.statuses.push_back(row == 0 ? 1 : 0);
+      given.tracks.push_back(at(row, slot));
+      given.statuses.push_back(row == 0 ? 1 : 0);
     }
   }
   return clip;
@@ -206,8 +209,9 @@ TEST(FindMotionGroupsTest, ClipsThatTellNothing) {
                 40, 0.025},
                {"none begins", Drawn(9, spread), 0, 0},
                {"no tracks", Drawn(9, spread), 0, 0}};
-  for (std::size_t i = 0; i < 40; ++i) cases[5].clip.statuses[i] = 0;
-  std::fill(cases[6].clip.statuses.begin(), cases[6].clip.statuses.end(), -1);
+  std::fill_n(GivenFrames::In(cases[5].clip).statuses.begin(), 40, 0);
+  std::vector<std::int32_t>& none = GivenFrames::In(cases[6].clip).statuses;
+  std::fill(none.begin(), none.end(), -1);
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     const MotionGroups groups = FindMotionGroups(c.clip);

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "host/stabilize/warped_plane.h"
+#include "tests/support/given_frames.h"
 
 namespace calmframe::host {
 namespace {
@@ -18,14 +19,15 @@ SolvedClip Warped(const std::function<Point(Point)>& warp, int source_width = 40
   clip.width = 401;
   clip.source_height = clip.height = 301;
   clip.frame_count = clip.slots = 1;
-  clip.tracks = {Point{}};
-  clip.statuses = {-1};
+  GivenFrames& given = GivenFrames::In(clip);
+  given.tracks = {Point{}};
+  given.statuses = {-1};
   clip.columns = 5;
   clip.rows = 4;
   for (int r = 0; r < clip.rows; ++r) {
     for (int c = 0; c < clip.columns; ++c) {
       const Point at = warp({100.0 * c - 200, 100.0 * r - 150});
-      clip.vertices.push_back({at.x + 200, at.y + 150});
+      given.vertices.push_back({at.x + 200, at.y + 150});
     }
   }
   return clip;
@@ -95,12 +97,12 @@ TEST(WarpedPlaneTest, FindsTheWayBackThroughABentFrameAndBesideIt) {
   const SolvedClip clip = Warped(Bent);
   const WarpedPlane plane(clip, Warps::solved);
   for (const Point at : {Point{200, 150}, {3, 297}, {399, 1}, {-30, 80}, {130, 330}, {287, 44}}) {
-    const Point back = plane.SourceAt(0, plane.At(0, at));
+    const Point back = plane.Frame(0).SourceAt(plane.Frame(0).At(at));
     EXPECT_NEAR(back.x, at.x, 2e-3);
     EXPECT_NEAR(back.y, at.y, 2e-3);
   }
   const SolvedClip folded = Warped([](Point) { return Point{}; });
-  EXPECT_TRUE(std::isnan(WarpedPlane(folded, Warps::solved).SourceAt(0, {3, 4}).x));
+  EXPECT_TRUE(std::isnan(WarpedPlane(folded, Warps::solved).Frame(0).SourceAt({3, 4}).x));
 }
 
 }  // namespace

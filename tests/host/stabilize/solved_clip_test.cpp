@@ -6,6 +6,7 @@
 #include "host/stabilize/follow_windows.h"
 #include "platform/hx/hx_controls.h"
 #include "tests/contract/played_plugin.h"
+#include "tests/support/given_frames.h"
 
 namespace calmframe::host {
 namespace {
@@ -100,8 +101,9 @@ class SolvedClipTest : public PlayedPlugin {
 void ExpectCells(const SolvedClip& clip, int row, const Similarity& window,
                  const WorldBuffer& source, const WorldBuffer& picture) {
   const int width = clip.source_width, height = clip.height;
+  const std::vector<Point> vertices = clip.VerticesOf(row);
   const auto vertex = [&](int c, int r) {
-    const Point p = Inverse(window)(clip.vertices[(row * clip.rows + r) * clip.columns + c]);
+    const Point p = Inverse(window)(vertices[r * clip.columns + c]);
     return Point{(p.x + 0.5) * width / clip.width - 0.5, p.y};
   };
   double worst = 0;
@@ -164,9 +166,10 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
     };
     const Point camera = camera_at(kRow), before = camera_at(kRow - 1);
     int still = 0, tracked = 0;
-    for (int i = kRow * clip.slots; i < (kRow + 1) * clip.slots; ++i) {
-      if (clip.statuses[i] != 0) continue;
-      const Point p = clip.tracks[i], q = clip.tracks[i - clip.slots];
+    const TrackRow row = clip.TracksOf(kRow), row_before = clip.TracksOf(kRow - 1);
+    for (int slot = 0; slot < clip.slots; ++slot) {
+      if (row.statuses[slot] != 0) continue;
+      const Point p = row.places[slot], q = row_before.places[slot];
       still += std::hypot(p.x + camera.x - q.x - before.x, p.y + camera.y - q.y - before.y) < 0.2;
       ++tracked;
     }
@@ -174,10 +177,11 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
     EXPECT_GT(still, tracked * 0.9);
     if (c.warps == Warps::none) {
       const std::vector<Point> rest = GridAtRest(clip);
-      std::copy(rest.begin(), rest.end(),
-                clip.vertices.begin() + kRow * static_cast<std::ptrdiff_t>(rest.size()));
+      std::copy(
+          rest.begin(), rest.end(),
+          GivenFrames::In(clip).vertices.begin() + kRow * static_cast<std::ptrdiff_t>(rest.size()));
     }
-    const Point corner = clip.vertices[kRow * clip.columns * clip.rows];
+    const Point corner = clip.VerticesOf(kRow)[0];
     const double aspect = clip.width / static_cast<double>(clip.source_width);
     for (const double scale : {0.8, 1.2, 2.0}) {  // the last leaves a rim of nothing all around
       SCOPED_TRACE(scale);
@@ -220,7 +224,7 @@ TEST_F(SolvedClipTest, WindowsShowTheirPartOfThePlane) {
 TEST_F(SolvedClipTest, WhereTheBoundsLieIsNotSeen) {
   const Played cropped = Play({"one", 3, 2}), filled = Play({"one", 4, 2});
   const SolvedClip& clip = filled.clip;
-  ASSERT_TRUE(clip.vertices == cropped.clip.vertices);
+  ASSERT_TRUE(GivenFrames::Of(clip).vertices == GivenFrames::Of(cropped.clip).vertices);
   for (const Point aside : {Point{9, -7}, Point{-9, 7}}) {
     Windows windows;
     for (int f = 0; f < clip.frame_count; ++f) {
@@ -322,10 +326,11 @@ TEST_F(SolvedClipTest, PerspectiveWarps) {
   std::memcpy(bytes.data() + mesh, corners, sizeof corners);
   SolvedClip turned = ReadSolvedClip(bytes);
   const SolvedClip back = ReadSolvedClip(WithWindows(bytes, Windows(16, turn)));
+  const std::vector<Point> of_turned = turned.VerticesOf(0), of_back = back.VerticesOf(0);
   for (int i = 0; i < turned.columns * turned.rows; ++i) {
     const Point p = keystone(i % turned.columns / (turned.columns - 1.0),
                              i / turned.columns / (turned.rows - 1.0));
-    const Point q = turn(p), a = turned.vertices[i], b = back.vertices[i];
+    const Point q = turn(p), a = of_turned[i], b = of_back[i];
     ASSERT_NEAR(std::hypot(a.x - q.x, a.y - q.y), 0, 1e-9) << i;
     ASSERT_NEAR(std::hypot(b.x - p.x, b.y - p.y), 0, 0.003) << i;
   }
@@ -354,7 +359,7 @@ TEST_F(SolvedClipTest, ForeignAndDamagedInstances) {
   const Windows windows(static_cast<std::size_t>(played.clip.frame_count));
   const Bytes &zipped = played.saved.instance, raw = WithWindows(zipped, windows);
   EXPECT_EQ(zipped[5], 0);
-  EXPECT_EQ(ReadSolvedClip(raw).vertices, played.clip.vertices);
+  EXPECT_EQ(GivenFrames::Of(ReadSolvedClip(raw)).vertices, GivenFrames::Of(played.clip).vertices);
 
   const std::size_t mesh = After(raw, "hseM"), map = After(raw, "NotM"), solve = After(raw, "vloS");
   const std::vector<std::pair<std::size_t, std::vector<std::uint32_t>>> damages = {

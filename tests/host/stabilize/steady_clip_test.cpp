@@ -16,6 +16,7 @@
 #include "host/stabilize/film.h"
 #include "platform/hx/hx_controls.h"
 #include "tests/support/drawn_clip.h"
+#include "tests/support/given_frames.h"
 #include "tests/support/scratch_folder.h"
 
 namespace calmframe::host {
@@ -201,7 +202,8 @@ TEST_F(SteadyClipTest, WhatWasFoundBeforeGivesTheSame) {
 TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayOutUntilTheyAreBack) {
   Onlooker onlooker;
   const auto count = [](const SolvedClip& clip) {
-    return std::count_if(clip.statuses.begin(), clip.statuses.end(),
+    const std::vector<std::int32_t> statuses = GivenFrames::Of(clip).statuses;
+    return std::count_if(statuses.begin(), statuses.end(),
                          [](std::int32_t status) { return status > 0; });
   };
   Film film(CALMFRAME_PLUGIN, path_);
@@ -210,7 +212,7 @@ TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayOutUntilTheyAreBack) {
   const SolvedClip all = clip.Solved();
   std::set<TrackPoint> some;
   for (std::int32_t slot = 0; slot < all.slots && some.size() < 5; ++slot) {
-    if (all.statuses[static_cast<std::size_t>(slot)] > 0) some.insert({0, slot});
+    if (all.TracksOf(0).statuses[static_cast<std::size_t>(slot)] > 0) some.insert({0, slot});
   }
   ASSERT_EQ(some.size(), 5u);
   clip.DeleteTracks(some);
@@ -227,7 +229,7 @@ TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayOutUntilTheyAreBack) {
   EXPECT_TRUE(again.Work(onlooker).solve);
   again.DeleteTracks({});
   again.Work(onlooker);
-  EXPECT_EQ(again.Solved().vertices, all.vertices);
+  EXPECT_EQ(GivenFrames::Of(again.Solved()).vertices, GivenFrames::Of(all).vertices);
 }
 
 TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayApartFromAGroupThatIsLeftOut) {
@@ -319,8 +321,9 @@ TEST_F(SteadyClipTest, StoppedWorkGoesOnToTheSameEnd) {
     clip.Work(patient);
     const SolvedClip solved = clip.Solved();
     EXPECT_TRUE(solved.crop) << stage;
-    if (expected.empty()) expected = solved.vertices;
-    EXPECT_TRUE(solved.vertices == expected) << stage;
+    const std::vector<Point> vertices = GivenFrames::Of(solved).vertices;
+    if (expected.empty()) expected = vertices;
+    EXPECT_TRUE(vertices == expected) << stage;
   }
 }
 

@@ -52,12 +52,12 @@ TEST(PackedWarpTest, ComesBackAsItWasAndIsSmall) {
     q.offsets.push_back(i % 2 ? std::numeric_limits<std::int32_t>::max()
                               : std::numeric_limits<std::int32_t>::min());
   }
-  const quantised_warp back = unpack(pack(q, cols, rows), cols, rows);
+  const quantised_warp back = unpack(pack(q, cols), cols, rows);
   EXPECT_EQ(back.offsets, q.offsets);
   EXPECT_EQ(back.corners[2].y, -1e300);
   // Of planes nothing is left but their first row and column: 3 groups of 16 and less.
   for (std::size_t i = 1; i < q.offsets.size(); i += 2) q.offsets[i] = 5;
-  packed_warp packed = pack(q, cols, rows);
+  packed_warp packed = pack(q, cols);
   EXPECT_LT(packed.offsets.size(), 70u);
   packed.offsets.pop_back();
   EXPECT_THROW(unpack(packed, cols, rows), std::invalid_argument);

@@ -77,7 +77,7 @@ class DeletionsTest : public ::testing::Test {
   std::int32_t StatusOf(std::int32_t slot) {
     std::int32_t status = 0;
     hosted.Inside([&](StabilizerEffect& effect) {
-      status = (*TableOf(*effect.GetState()).features)[slot].status;
+      status = (*marrow::tracking::CellsOf(TableOf(*effect.GetState())))[slot].status;
     });
     return status;
   }

@@ -28,11 +28,12 @@ class StoredServiceTest : public ::testing::Test {
     EXPECT_NE(hosted.RunsFor(kFraming, framing), "");
   }
 
-  HostedEffect hosted{SmallClip(), {.keeps_analysis_raw = true}};
+  HostedEffect hosted{SmallClip(), {.saves_as = PayloadForm::raw}};
 };
 
 TEST_F(StoredServiceTest, ASolvedEffectComesBackBitForBitAndHasNothingToDo) {
-  for (const int framing : {2, 4}) {
+  for (const auto& [framing, form] : {std::pair{2, PayloadForm::raw}, {4, PayloadForm::packed}}) {
+    hosted.host().SaveAs(form);
     Solve(framing);
     const SavedEffect saved = hosted.Save();
     const std::vector<double> warp = hosted.Warp(3);
@@ -79,8 +80,8 @@ TEST_F(StoredServiceTest, SavedInTheMiddleOfASolveItSolves) {
 }
 
 TEST(StoredCompressionTest, OptionsAndTheHostDecideWhetherItIsDeflated) {
-  for (const bool prefers_raw : {false, true}) {
-    HostedEffect hosted(SmallClip(), {.keeps_analysis_raw = prefers_raw});
+  for (const PayloadForm form : {PayloadForm::deflated, PayloadForm::raw, PayloadForm::packed}) {
+    HostedEffect hosted(SmallClip(), {.saves_as = form});
     ASSERT_EQ(hosted.Analyse(), 8);
     std::size_t sizes[2] = {};
     for (const auto& [always, never] : {std::pair{true, true}, {true, false}, {false, true}}) {
@@ -92,7 +93,7 @@ TEST(StoredCompressionTest, OptionsAndTheHostDecideWhetherItIsDeflated) {
     }
     EXPECT_LT(sizes[0], sizes[1] / 2);
     tessel::debug::DebugDatabase::Set("AnalysisDataIsNeverCompressed", false);
-    EXPECT_EQ(BytesOf(hosted.Save())[5], prefers_raw ? 1 : 0);
+    EXPECT_EQ(BytesOf(hosted.Save())[5], static_cast<int>(form));
     EXPECT_FALSE(hosted.Warp(3).empty());
   }
 }

@@ -37,6 +37,19 @@ enum : std::uint32_t {
   kPresentVersion = kCropWindow
 };
 
+// How a payload stands in its handle, as the handle's raw flag tells it. Packed ones stay in the
+// memory of the process that makes them: a host asks for them by a preference of 2.
+enum class PayloadForm : std::uint8_t {
+  deflated = 0,
+  raw = 1,    // and whatever is none of the others
+  packed = 2  // raw, but for warps and tracks; of the present version alone
+};
+inline PayloadForm FormOf(std::uint32_t version, std::uint8_t raw) {
+  if (raw == 0 || version < kRawPayloads) return PayloadForm::deflated;
+  const bool is_packed = raw == static_cast<std::uint8_t>(PayloadForm::packed);
+  return is_packed && version == kPresentVersion ? PayloadForm::packed : PayloadForm::raw;
+}
+
 // Throws StreamError unless `count` records of at least `size` bytes each can still follow. To be
 // asked before memory is taken for them.
 inline void ExpectRoomFor(const tessel::filesupport::InputByteStream& in, std::uint64_t count,

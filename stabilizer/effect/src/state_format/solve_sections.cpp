@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <boost/make_shared.hpp>
 #include <limits>
+#include <stdexcept>
 #include <utility>
 #include <vector>
 
@@ -13,6 +14,7 @@ namespace kelp::effect::state_format {
 using marrow::stabilization::CPWarper;
 using marrow::stabilization::matrix3;
 using marrow::stabilization::MtoNMap;
+using marrow::stabilization::packed_warp;
 using marrow::stabilization::point2;
 using marrow::stabilization::quantised_warp;
 using tessel::filesupport::InputByteStream;
@@ -32,9 +34,16 @@ std::int32_t Side(std::uint64_t pixels) {
 
 }  // namespace
 
-void WriteWarps(OutputByteStream& out, const CPWarper& warper) {
+void WriteWarps(OutputByteStream& out, const CPWarper& warper, PayloadForm form) {
   out << warper.gridCols() << warper.gridRows();
   for (std::size_t f = 0; f < warper.frameWarpCount(); ++f) {
+    if (form == PayloadForm::packed) {
+      const packed_warp& warp = warper.packedWarp(f);
+      out.Write(warp.corners.data(), sizeof warp.corners);
+      out << static_cast<std::uint32_t>(warp.offsets.size());
+      out.Write(warp.offsets.data(), warp.offsets.size());
+      continue;
+    }
     const quantised_warp warp = warper.storedWarp(f);
     out.Write(warp.corners.data(), sizeof warp.corners);
     out.Write(warp.offsets.data(), warp.offsets.size() * sizeof warp.offsets[0]);
@@ -47,7 +56,29 @@ GridSize ReadGridSize(InputByteStream& in) {
   return size;
 }
 
-void ReadWarps(InputByteStream& in, CPWarper& warper) {
+namespace {
+
+void ReadPackedWarps(InputByteStream& in, CPWarper& warper) {
+  for (std::int32_t f = 0; f < warper.frameCount(); ++f) {
+    packed_warp warp;
+    in.Read(warp.corners.data(), sizeof warp.corners);
+    std::uint32_t size = 0;
+    in >> size;
+    ExpectRoomFor(in, size, 1);
+    warp.offsets.resize(size);
+    in.Read(warp.offsets.data(), size);
+    try {
+      warper.storeFrameWarp(std::move(warp));
+    } catch (const std::invalid_argument&) {
+      throw StreamError("a packed warp's bytes are none");
+    }
+  }
+}
+
+}  // namespace
+
+void ReadWarps(InputByteStream& in, PayloadForm form, CPWarper& warper) {
+  if (form == PayloadForm::packed) return ReadPackedWarps(in, warper);
   const std::int32_t cols = warper.gridCols(), rows = warper.gridRows();
   quantised_warp warp;
   warp.offsets.resize(2 * static_cast<std::size_t>(cols) * static_cast<std::size_t>(rows));

@@ -27,8 +27,9 @@ constexpr std::size_t kLongestText = 1 << 16;
 
 class StateBinaryConverter {
  public:
-  StateBinaryConverter(InputByteStream& in, std::uint32_t version, const SourceShape& present)
-      : in_(in), version_(version), present_(present) {}
+  StateBinaryConverter(InputByteStream& in, std::uint32_t version, PayloadForm form,
+                       const SourceShape& present)
+      : in_(in), version_(version), form_(form), present_(present) {}
 
   SavedState Read() {
     ReadAnalysis();
@@ -169,7 +170,7 @@ class StateBinaryConverter {
     if (grid.cols != warper->gridCols() || grid.rows != warper->gridRows()) {
       throw StateRefused(StateRefused::Reason::Grid, "warps over another grid");
     }
-    ReadWarps(in_, *warper);
+    ReadWarps(in_, form_, *warper);
     if (Has(kFrameMap)) {
       PassMapMarker();
       warper->setFrameMap(ReadFrameMap(in_, frames()));
@@ -185,7 +186,7 @@ class StateBinaryConverter {
   void ReadTracks() {
     Expect(Marker::StrF);
     in_ >> result_.all_features.first_frame;
-    ReadTrackTable(in_, Has(kFixedPointPositions), result_.all_features);
+    ReadTrackTable(in_, Has(kFixedPointPositions), form_, result_.all_features);
   }
 
   void SettleFlags() {
@@ -200,6 +201,7 @@ class StateBinaryConverter {
 
   InputByteStream& in_;
   const std::uint32_t version_;
+  const PayloadForm form_;
   const SourceShape present_;
   SavedState state_;
   analysis::AnalysisResult result_;
@@ -208,16 +210,17 @@ class StateBinaryConverter {
 
 }  // namespace
 
-SavedState ReadState(const void* payload, std::size_t size, std::uint32_t version, bool raw,
+SavedState ReadState(const void* payload, std::size_t size, std::uint32_t version, std::uint8_t raw,
                      const SourceShape& present) try {
   tessel::filesupport::IStringByteStream bytes(payload, size);
-  if (raw && version >= kRawPayloads) {
-    SavedState state = StateBinaryConverter(bytes, version, present).Read();
+  const PayloadForm form = FormOf(version, raw);
+  if (form != PayloadForm::deflated) {
+    SavedState state = StateBinaryConverter(bytes, version, form, present).Read();
     if (bytes.MaxBytesLeft() != 0) throw StreamError("more data than was expected");
     return state;
   }
   tessel::filesupport::IZipByteStream inflated(bytes);
-  SavedState state = StateBinaryConverter(inflated, version, present).Read();
+  SavedState state = StateBinaryConverter(inflated, version, form, present).Read();
   inflated.Finish();
   return state;
 } catch (const StreamError& error) {

@@ -23,15 +23,16 @@ class StateRefused : public std::runtime_error {
   SourceShape stored;
 };
 
-// Reads a payload of the version, kOldestVersion to kPresentVersion of format.h; versions before
-// raw payloads were known are deflated whatever `raw` says. Nothing may follow the state.
+// Reads a payload of the version, kOldestVersion to kPresentVersion of format.h. `raw`: the flag
+// that came with it; see PayloadForm. Versions before raw payloads were known are deflated whatever
+// it says. Nothing may follow the state.
 // `present`: the source as it is now; on that of an instance without a layer any state loads.
 // Throws StateRefused, and std::bad_alloc: it takes no more memory than a small multiple of the
 // inflated bytes, and nothing on the word of a count alone.
 //
 // What older versions lack is filled in so that the missing work is done again and no other: a
 // solved state without a crop has a crop hash that no parameters have.
-SavedState ReadState(const void* payload, std::size_t size, std::uint32_t version, bool raw,
+SavedState ReadState(const void* payload, std::size_t size, std::uint32_t version, std::uint8_t raw,
                      const SourceShape& present);
 
 }  // namespace kelp::effect

@@ -30,27 +30,27 @@ void WriteAnalysis(OutputByteStream& out, const SavedState& state) {
   if (state.job) out << JobText(*state.job);
 }
 
-void WriteSolve(OutputByteStream& out, const SavedState& state) {
+void WriteSolve(OutputByteStream& out, const SavedState& state, PayloadForm form) {
   const SolveResult& solve = *state.solve_result;
   const bool without_results = state.phase == SolvePhase::Solved && !solve.warper;
   const SolvePhase phase = without_results ? SolvePhase::None : state.phase;
   Write(out, Marker::Solv);
   out << static_cast<std::int32_t>(phase) << solve.solve_hash << solve.crop_hash;
   Write(out, Marker::Mesh);
-  if (phase == SolvePhase::Solved) WriteWarps(out, *solve.warper);
+  if (phase == SolvePhase::Solved) WriteWarps(out, *solve.warper, form);
   Write(out, Marker::MtoN);
   WriteFrameMap(out, phase == SolvePhase::Solved ? solve.warper->frameMap().get() : nullptr);
 }
 
 }  // namespace
 
-void WriteState(OutputByteStream& out, const SavedState& state) {
+void WriteState(OutputByteStream& out, const SavedState& state, PayloadForm form) {
   const auto& crop = state.solve_result->crop;
   WriteAnalysis(out, state);
-  WriteSolve(out, state);
+  WriteSolve(out, state, form);
   Write(out, Marker::StrF);
   out << state.result->all_features.first_frame;
-  WriteTrackTable(out, state.result->all_features);
+  WriteTrackTable(out, state.result->all_features, form);
   Write(out, Marker::Crop);
   out << bool{crop};
   if (crop) WriteCrop(out, *crop);

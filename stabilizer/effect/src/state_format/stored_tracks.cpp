@@ -1,10 +1,13 @@
 #include "stabilizer/effect/src/state_format/stored_tracks.h"
 
 #include <algorithm>
+#include <boost/make_shared.hpp>
 #include <cmath>
 #include <cstdint>
 #include <limits>
+#include <span>
 #include <stdexcept>
+#include <utility>
 #include <vector>
 
 #include "stabilizer/effect/src/state_format/format.h"
@@ -12,10 +15,16 @@
 namespace kelp::effect::state_format {
 namespace {
 
+using marrow::tracking::AllFeatures;
+using marrow::tracking::PackedCells;
+using marrow::tracking::TrackCells;
+using tessel::filesupport::InputByteStream;
+using tessel::filesupport::OutputByteStream;
+using tessel::filesupport::StreamError;
 using Cell = marrow::tracking::tracking_feature<float>;
+using Words = std::vector<std::int32_t>;
 
 constexpr float kStepsPerPixel = 32.0f;
-constexpr float kStep = 0.03125f;
 constexpr std::uint64_t kCellBytes = 12;
 // Beyond what the fixed-point form can hold; no frame is that large.
 constexpr float kFarthest = 67108864.0f;
@@ -44,59 +53,129 @@ void ForEachPiece(std::size_t cells, const Visit& visit) {
   }
 }
 
-}  // namespace
+void WriteWords(OutputByteStream& out, const Words& words) {
+  out.Write(words.data(), words.size() * sizeof words[0]);
+}
 
-void WriteTrackTable(tessel::filesupport::OutputByteStream& out,
-                     const marrow::tracking::AllFeatures& table) {
-  const marrow::tracking::TrackCells& cells = *table.features;
-  if (cells.size() !=
-      static_cast<std::size_t>(table.feature_count) * static_cast<std::size_t>(table.frame_count)) {
-    throw std::logic_error("track table of another size than its counts tell");
-  }
-  std::vector<std::int32_t> words;
-  ForEachPiece(cells.size(), [&](std::size_t first, std::size_t count) {
-    words.clear();
-    for (std::size_t i = first; i < first + count; ++i) {
-      words.push_back(Steps(cells[i].x));
-      words.push_back(Steps(cells[i].y));
+void ReadWords(InputByteStream& in, Words& words) {
+  in.Read(words.data(), words.size() * sizeof words[0]);
+}
+
+void WritePackedTable(OutputByteStream& out, const AllFeatures& table) {
+  std::vector<Cell> cells(static_cast<std::size_t>(table.feature_count));
+  Words steps(2 * cells.size()), statuses(cells.size());
+  for (std::size_t row = 0; row < static_cast<std::size_t>(table.frame_count); ++row) {
+    std::vector<std::uint8_t> made;
+    std::span<const std::uint8_t> bytes;
+    if (table.packed) {
+      bytes = table.packed->packed(row);
+    } else {
+      table.ReadRow(row, cells.data());
+      for (std::size_t s = 0; s < cells.size(); ++s) {
+        steps[s] = Steps(cells[s].x);
+        steps[cells.size() + s] = Steps(cells[s].y);
+        statuses[s] = cells[s].status;
+      }
+      bytes = made = PackedCells::Pack(row, steps, statuses);
     }
-    out.Write(words.data(), words.size() * sizeof words[0]);
-  });
-  ForEachPiece(cells.size(), [&](std::size_t first, std::size_t count) {
-    words.clear();
-    for (std::size_t i = first; i < first + count; ++i) words.push_back(cells[i].status);
-    out.Write(words.data(), words.size() * sizeof words[0]);
+    out << static_cast<std::uint32_t>(bytes.size());
+    out.Write(bytes.data(), bytes.size());
+  }
+}
+
+void ReadPackedTable(InputByteStream& in, std::uint64_t rows, PackedCells& cells) {
+  for (std::uint64_t row = 0; row < rows; ++row) {
+    std::uint32_t size = 0;
+    in >> size;
+    ExpectRoomFor(in, size, 1);
+    std::vector<std::uint8_t> bytes(size);
+    in.Read(bytes.data(), size);
+    if (!cells.AppendPacked(std::move(bytes))) throw StreamError("a row of tracks is none");
+  }
+}
+
+// Positions of the oldest versions, which no steps hold.
+void ReadFloatPositions(InputByteStream& in, std::uint64_t count, TrackCells& cells) {
+  // A zip stream's bound lies far above what most hold, so cells come into being as they are read.
+  ForEachPiece(count, [&](std::size_t first, std::size_t of_piece) {
+    cells.resize(first + of_piece);
+    std::vector<float> floats(2 * of_piece);
+    in.Read(floats.data(), floats.size() * sizeof floats[0]);
+    for (std::size_t i = 0; i < of_piece; ++i) {
+      cells[first + i] = {Tame(floats[2 * i]), Tame(floats[2 * i + 1]), 0, 0};
+    }
   });
 }
 
-void ReadTrackTable(tessel::filesupport::InputByteStream& in, bool fixed_point,
-                    marrow::tracking::AllFeatures& table) {
+}  // namespace
+
+void WriteTrackTable(OutputByteStream& out, const AllFeatures& table, PayloadForm form) {
+  const auto slots = static_cast<std::size_t>(table.feature_count);
+  const auto rows = static_cast<std::size_t>(table.frame_count);
+  if (table.packed ? table.packed->slots() != slots || table.packed->rows() != rows
+                   : table.features->size() != slots * rows) {
+    throw std::logic_error("track table of another size than its counts tell");
+  }
+  if (form == PayloadForm::packed) return WritePackedTable(out, table);
+  std::vector<Cell> cells(slots);
+  Words words;
+  for (std::size_t row = 0; row < rows; ++row) {
+    table.ReadRow(row, cells.data());
+    words.clear();
+    for (const Cell& cell : cells) {
+      words.push_back(Steps(cell.x));
+      words.push_back(Steps(cell.y));
+    }
+    WriteWords(out, words);
+  }
+  for (std::size_t row = 0; row < rows; ++row) {
+    table.ReadRow(row, cells.data());
+    words.clear();
+    for (const Cell& cell : cells) words.push_back(cell.status);
+    WriteWords(out, words);
+  }
+}
+
+void ReadTrackTable(InputByteStream& in, bool fixed_point, PayloadForm form, AllFeatures& table) {
   const auto slots = static_cast<std::uint64_t>(table.feature_count);
   const auto rows = static_cast<std::uint64_t>(table.frame_count);
+  const auto packed = boost::make_shared<PackedCells>(slots);
+  if (form == PayloadForm::packed) {
+    ReadPackedTable(in, rows, *packed);
+    table.packed = packed;
+    return;
+  }
   ExpectRoomFor(in, slots * rows, kCellBytes);
-  marrow::tracking::TrackCells& cells = *table.features;
-  // A zip stream's bound lies far above what most hold, so cells come into being as they are read.
-  ForEachPiece(slots * rows, [&](std::size_t first, std::size_t count) {
-    cells.resize(first + count);
-    std::vector<std::int32_t> fixed(fixed_point ? 2 * count : 0);
-    std::vector<float> floats(fixed_point ? 0 : 2 * count);
-    if (fixed_point) {
-      in.Read(fixed.data(), fixed.size() * sizeof fixed[0]);
-    } else {
-      in.Read(floats.data(), floats.size() * sizeof floats[0]);
+  if (!fixed_point) {
+    TrackCells& cells = *table.features;
+    ReadFloatPositions(in, slots * rows, cells);
+    ForEachPiece(slots * rows, [&](std::size_t first, std::size_t count) {
+      Words statuses(count);
+      ReadWords(in, statuses);
+      for (std::size_t i = 0; i < count; ++i) cells[first + i].status = statuses[i];
+    });
+    return;
+  }
+  // A zip stream's bound lies far above what most hold, so rows come into being as they are read.
+  for (std::uint64_t row = 0; row < rows; ++row) {
+    Words pairs, steps;
+    for (std::size_t left = 2 * slots; left > 0;) {
+      const std::size_t first = pairs.size();
+      pairs.resize(first + std::min<std::size_t>(left, kPiece));
+      in.Read(pairs.data() + first, (pairs.size() - first) * sizeof pairs[0]);
+      left -= pairs.size() - first;
     }
-    for (std::size_t i = 0; i < count; ++i) {
-      Cell& cell = cells[first + i];
-      cell.x = fixed_point ? static_cast<float>(fixed[2 * i]) * kStep : Tame(floats[2 * i]);
-      cell.y = fixed_point ? static_cast<float>(fixed[2 * i + 1]) * kStep : Tame(floats[2 * i + 1]);
-      cell.correlation = 0;
+    for (const std::size_t axis : {0, 1}) {
+      for (std::size_t s = 0; s < slots; ++s) steps.push_back(pairs[2 * s + axis]);
     }
-  });
-  ForEachPiece(slots * rows, [&](std::size_t first, std::size_t count) {
-    std::vector<std::int32_t> statuses(count);
-    in.Read(statuses.data(), count * sizeof statuses[0]);
-    for (std::size_t i = 0; i < count; ++i) cells[first + i].status = statuses[i];
-  });
+    packed->AppendPositions(steps);
+  }
+  for (std::uint64_t row = 0; row < rows; ++row) {
+    Words statuses(slots);
+    ReadWords(in, statuses);
+    packed->SetStatuses(row, statuses);
+  }
+  table.packed = packed;
 }
 
 }  // namespace kelp::effect::state_format

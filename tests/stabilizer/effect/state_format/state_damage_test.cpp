@@ -42,16 +42,18 @@ constexpr std::int64_t kScratch = 1 << 20;
 // Whether it loads; `written`, if given, is what is then written. Fails the test for anything else
 // than that or a refusal, for memory beyond `expanded` bytes many times, and for a state that can't
 // be written.
-bool Loads(const std::string& payload, std::uint32_t version, bool raw, std::size_t expanded,
+bool Loads(const std::string& payload, std::uint32_t version, int raw, std::size_t expanded,
            std::string* written = nullptr) {
   const std::int64_t limit = live + kScratch + 6 * static_cast<std::int64_t>(expanded);
   most = live;
   try {
-    const SavedState state = ReadState(payload.data(), payload.size(), version, raw, kDamagedShape);
+    const SavedState state = ReadState(payload.data(), payload.size(), version,
+                                       static_cast<std::uint8_t>(raw), kDamagedShape);
     EXPECT_LE(most, limit);
     const auto& table = state.result->all_features;
-    EXPECT_EQ(table.features->size(), static_cast<std::size_t>(table.frame_count) *
-                                          static_cast<std::size_t>(table.feature_count));
+    EXPECT_EQ(marrow::tracking::CellsOf(table)->size(),
+              static_cast<std::size_t>(table.frame_count) *
+                  static_cast<std::size_t>(table.feature_count));
     if (state.solve_result->warper) {
       EXPECT_EQ(static_cast<int>(state.solve_result->warper->frameWarpCount()), table.frame_count);
     }
@@ -84,6 +86,18 @@ TEST(StateDamageTest, WhatIsCutIsRefusedAndWhatIsFlippedIsRefusedOrLoads) {
       std::string flipped = plain;
       flipped[i] ^= static_cast<char>(std::array{0x01, 0x80, 0xff}[i / step % 3]);
       ++(loads(flipped) ? loaded : refused);
+    }
+    if (version == 16) {
+      tessel::filesupport::OStringByteStream out;
+      WriteState(out, ReadState(plain.data(), plain.size(), 16, 1, kDamagedShape),
+                 state_format::PayloadForm::packed);
+      const std::string packed = out.Take();
+      ASSERT_TRUE(Loads(packed, 16, 2, plain.size()));
+      for (std::size_t i = 0; i < packed.size(); ++i) {
+        std::string flipped = packed;
+        flipped[i] ^= static_cast<char>(std::array{0x01, 0x80, 0xff}[i % 3]);
+        ++(Loads(flipped, 16, 2, plain.size()) ? loaded : refused);
+      }
     }
     // A check value guards a deflated one.
     for (std::size_t i = 0; i < deflated.size(); i += step) {

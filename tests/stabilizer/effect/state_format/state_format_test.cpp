@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <boost/make_shared.hpp>
 #include <fstream>
 #include <limits>
 #include <sstream>
@@ -9,6 +10,7 @@
 #include "stabilizer/effect/src/state_format/state_reader.h"
 #include "stabilizer/effect/src/state_format/state_writer.h"
 #include "tests/stabilizer/effect/state_format/samples.h"
+#include "tests/support/kept_state.h"
 
 namespace kelp::effect {
 namespace {
@@ -80,7 +82,8 @@ std::string Described(const SavedState& state) {
         job->job_input_parameters.StepTime.denominator);
   }
   put(", table", table.frame_count, table.feature_count, "from", table.first_frame);
-  for (const auto& cell : *table.features) put(";", cell.x, cell.y, cell.status, cell.correlation);
+  const auto cells = marrow::tracking::CellsOf(table);
+  for (const auto& cell : *cells) put(";", cell.x, cell.y, cell.status, cell.correlation);
   put(", phase", static_cast<int>(state.phase), solve_hash, crop_hash);
   if (warper) {
     const auto vertex = warper->frameWarp(1)->vertex(2, 0);
@@ -154,8 +157,13 @@ TEST(StateFormatTest, AnotherSourceOrGridIsRefused) {
 
 // Positions are 32nds of a pixel, halves away from zero; what dead cells hold may be anything.
 TEST(StateFormatTest, PositionsAreRoundedAndDeadCellsAreHarmless) {
-  const SavedState state = Read("v16_solved");
-  auto& cells = *state.result->all_features.features;
+  SavedState state = Read("v16_solved");
+  marrow::tracking::AllFeatures table = TableOf(state);
+  table.features =
+      boost::make_shared<marrow::tracking::TrackCells>(*marrow::tracking::CellsOf(table));
+  table.packed = nullptr;
+  KeepTable(state, table);
+  auto& cells = *table.features;
   const float nan = std::numeric_limits<float>::quiet_NaN();
   const float infinity = std::numeric_limits<float>::infinity();
   cells[0] = {1.0f + 1.0f / 64, -1.0f - 1.0f / 64, 1, 0.5f};
@@ -163,7 +171,8 @@ TEST(StateFormatTest, PositionsAreRoundedAndDeadCellsAreHarmless) {
   cells[2] = {-1e30f, 2.01f, -4, 0};
   const std::string once = Written(state);
   const SavedState back = Read(once, 16, true);
-  const auto& read = *back.result->all_features.features;
+  const auto read_cells = marrow::tracking::CellsOf(TableOf(back));
+  const auto& read = *read_cells;
   EXPECT_EQ(read[0].x, 1.03125f);
   EXPECT_EQ(read[0].y, -1.03125f);
   EXPECT_EQ(read[0].correlation, 0);
@@ -173,6 +182,29 @@ TEST(StateFormatTest, PositionsAreRoundedAndDeadCellsAreHarmless) {
   EXPECT_EQ(read[2].y, 2.0f);
   EXPECT_EQ(read[2].status, -4);
   EXPECT_TRUE(Written(back) == once);
+}
+
+// What is packed holds as much, in less; and as much again where it is written once more.
+TEST(StateFormatTest, WhatIsPackedComesBackAsItWas) {
+  for (const char* const name : {"v16_solved", "v16_empty"}) {
+    const SavedState state = Read(name);
+    const auto packed = [](const SavedState& written) {
+      tessel::filesupport::OStringByteStream out;
+      WriteState(out, written, state_format::PayloadForm::packed);
+      return out.Take();
+    };
+    const std::string once = packed(state);
+    const SavedState back = ReadState(once.data(), once.size(), 16, 2, kPresent);
+    EXPECT_EQ(Described(back), Described(state));
+    EXPECT_TRUE(Written(back) == Written(state));
+    EXPECT_TRUE(packed(back) == once);
+    if (state.solve_result->warper) {
+      EXPECT_LT(once.size(), Written(state).size());
+    }
+    for (std::size_t i = 0; i < once.size(); ++i) {
+      EXPECT_THROW(ReadState(once.data(), i, 16, 2, kPresent), StateRefused) << i;
+    }
+  }
 }
 
 // The solved sample, with what `change` makes of its job's text.
