@@ -48,6 +48,7 @@ int main(int argc, char** argv) {
   write(kOfStranger, Do("look", R"(,"frame":7)"));
   write(kOfStranger, Do("save", R"(,"path":"/tmp/a.calm","overwrite":true)"));
   write(kOfStranger, Do("render", R"(,"path":"/tmp/a.mp4","crf":18,"from":"1")"));
+  write(kOfStranger, Do("render", R"(,"path":"/tmp/a.mp4","preset":"slow","options":["g=9"])"));
   write(kOfStranger, Do("undo") + Do("redo"));
   write(kOfStranger, Request("POST /login", "password=a%20b"));
   const std::string whole = Do("open");

@@ -9,7 +9,7 @@ const AT_ONCE = 4;      // requests
 const KEPT = 5e7;       // pixels of decoded pictures, four bytes each
 const WIDEST_PLAYING = 960;
 const WIDEST_STILL = 1920;
-const ROUGH = 640;      // at least so wide is a picture that only bridges the time to a better one
+const ROUGH = 640;      // width of a picture that is better than none
 const PATIENCE = 60;    // milliseconds that a picture may take before a rough one goes ahead of it
 const REST = 250;       // milliseconds without a change, after which nobody is in a hurry
 
@@ -142,7 +142,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
 
   useEffect(() => {
     const engine = live.current;
-    let ended = false, timer = 0;
+    let ended = false, timer = 0, across = box.current.clientWidth;
     let shown = null, started = null, lastSpeed = 0, rate = [], drawn = '';
     // While it plays: pictures that don't come in time are made smaller, then every so many frames are left out.
     let narrow = false, stride = 1, slot = -1, seen = 0, hits = 0, since = 0;
@@ -196,7 +196,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
         const due = (now - since) / 1000 * of.info.rate * Math.abs(how.speed) / by;
         // Late pictures, or a screen that has no time to show as many.
         if (hits < 0.8 * seen || seen < 0.6 * due) {
-          if (!narrow && less < wide) narrow = true;
+          if (!narrow && less >= ROUGH / 2 && less < wide) narrow = true;
           else if (stride < 8) ++stride;
         } else if (hits > 0.95 * due && stride > 1) {
           --stride;
@@ -229,7 +229,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
       const ready = of.state === 'ready' || (of.picture && of.shots?.length);
       const wanted = ready ? engine.mode : 'before';
       const side = SIDES[wanted];
-      const room = Math.max(160, box.current.clientWidth / (wanted === 'side' ? 2 : 1) * devicePixelRatio);
+      const room = Math.max(160, across / (wanted === 'side' ? 2 : 1) * devicePixelRatio);
       // In steps, so that a window's size by itself makes no new pictures.
       const width = Math.min(of.info.shown_width, WIDEST_STILL, Math.ceil(room / 160) * 160);
       // Apart where it stands still: of a change the steady one alone is fetched.
@@ -279,7 +279,11 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
         requestAnimationFrame(() => { engine.loops = false; engine.work(); });
       }
     };
-    const watch = new ResizeObserver(engine.work);
+    // Asked for in each frame it would have the page laid out for each.
+    const watch = new ResizeObserver(() => {
+      across = box.current?.clientWidth || across;
+      engine.work();
+    });
     watch.observe(box.current);
     document.addEventListener('visibilitychange', engine.work);
     engine.work();
