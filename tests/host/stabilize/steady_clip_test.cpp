@@ -258,9 +258,12 @@ TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayApartFromAGroupThatIsLeftOut)
   const auto left_out = [](SteadyClip& clip) {
     std::set<TrackPoint> points;
     const SolvedClip solved = clip.Solved();
-    for (std::int32_t i = 0; i < static_cast<std::int32_t>(solved.statuses.size()); ++i) {
-      if (solved.statuses[static_cast<std::size_t>(i)] == -10) {
-        points.insert({solved.first_frame + i / solved.slots, i % solved.slots});
+    for (std::int32_t row = 0; row < solved.frame_count; ++row) {
+      const TrackRow tracks = solved.TracksOf(static_cast<std::size_t>(row));
+      for (std::int32_t slot = 0; slot < solved.slots; ++slot) {
+        if (tracks.statuses[static_cast<std::size_t>(slot)] == -10) {
+          points.insert({solved.first_frame + row, slot});
+        }
       }
     }
     return points;
@@ -279,9 +282,9 @@ TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayApartFromAGroupThatIsLeftOut)
     ASSERT_GT(group.size(), 5u);
     // One that the group has, and some that it hasn't.
     std::set<TrackPoint> deleted = {*group.begin()};
-    const SolvedClip solved = clip.Solved();
-    for (std::int32_t slot = 0; slot < solved.slots && deleted.size() < 4; ++slot) {
-      if (solved.statuses[static_cast<std::size_t>(slot)] > 0) deleted.insert({0, slot});
+    const TrackRow first = clip.Solved().TracksOf(0);
+    for (std::int32_t slot = 0; deleted.size() < 4; ++slot) {
+      if (first.statuses.at(static_cast<std::size_t>(slot)) > 0) deleted.insert({0, slot});
     }
     std::set<TrackPoint> both = group;
     both.insert(deleted.begin(), deleted.end());
@@ -299,7 +302,8 @@ TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayApartFromAGroupThatIsLeftOut)
     EXPECT_EQ(again.DeletedTracks(), deleted) << follows;
     hold(again, Still::background);
     EXPECT_EQ(left_out(again), both) << "drawn as it was shown: " << follows;
-    EXPECT_EQ(again.Solved().vertices, clip.Solved().vertices) << follows;
+    EXPECT_EQ(GivenFrames::Of(again.Solved()).vertices, GivenFrames::Of(clip.Solved()).vertices)
+        << follows;
     hold(again, Still::all);
     EXPECT_EQ(left_out(again), deleted) << "the group is back alone: " << follows;
     again.DeleteTracks({});
