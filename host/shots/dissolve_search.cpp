@@ -23,9 +23,10 @@ constexpr std::int64_t kLeastAside = 3, kMostAside = 8;
 constexpr double kWeak = 0.15;
 // What covariance and motion may take or add.
 constexpr double kDepth[2] = {0.7, 1.35};
-// ToneFit. By how much ends that lie well apart speak for a span where several overlap: of a part
-// of a dissolve the dip may fit better than of the whole, but its ends are nearer to each other.
-constexpr double kRankOfApart = 0.5;
+// ToneFit. Where spans overlap, ends that lie apart speak for one, half as much as its evidence and
+// up to what two scenes mostly have: of a part of a dissolve the dip may fit better than of the
+// whole, but its ends are nearer to each other.
+constexpr double kRankOfApart = 0.5, kApartEnough = 0.5;
 // A scene, and itself behind a short blur, have 0.33 at most.
 constexpr double kFar = 0.35;
 // A walk to anywhere has 0.6 (of a random one the first principal component explains 6 / pi^2, and
@@ -84,7 +85,7 @@ bool DissolveSearch::MayBe(const FrameHistory& history, Span& span) const {
   span.evidence = dip.evidence;
   if (!(dip.evidence > kWeak && dip.depth > kDepth[0] && dip.depth < kDepth[1])) return false;
   const double apart = FitTone(ramp).apart;
-  span.rank = dip.evidence + kRankOfApart * std::min(apart, 1.0);
+  span.rank = dip.evidence + kRankOfApart * std::min(apart, kApartEnough);
   return true;
 }
 
