@@ -32,9 +32,9 @@ constexpr double kFar = 0.35;
 // A walk to anywhere has 0.6 (of a random one the first principal component explains 6 / pi^2, and
 // is nearly a ramp), shaken pictures somewhat less, boards that pass 0.4 at most.
 constexpr double kStraight = 0.45;
-// Light that is to take as much detail as a dip of the least depth does must change by a fifth; in
-// dissolves it is 0.1 at most.
-constexpr double kLight = 0.15;
+// Light that takes as much of the squares as a dip of the least depth, half of 0.7, takes the root
+// of it from the luma.
+constexpr double kLight = 0.19;
 // What the first leaves of the last, laid over it: the same scene, moved, is no other shot.
 constexpr double kApart = 0.5;
 // The evidence and the gain, see GainBetween, added.

@@ -47,6 +47,28 @@ std::vector<double> SharesOf(const Ramp& ramp) {
   return shares;
 }
 
+// See ToneFit::light. The line is of the frames that show one shot alone: one through all would
+// give way to the arc.
+double LightOf(const Ramp& ramp, const std::vector<double>& shares) {
+  std::vector<double> lumas;
+  double sums[2] = {}, counts[2] = {};
+  for (std::size_t t = 0; t < shares.size(); ++t) {
+    const std::array<double, kCount>& parts = ramp.frames[t]->tone[0];
+    lumas.push_back(std::accumulate(parts.begin(), parts.end(), 0.0) / kCount);
+    if (shares[t] > 0 && shares[t] < 1) continue;
+    sums[shares[t] > 0] += lumas.back();
+    counts[shares[t] > 0] += 1;
+  }
+  double bent = 0, bend = 0;
+  for (std::size_t t = 0; t < shares.size(); ++t) {
+    const double a = shares[t], bow = 4 * a * (1 - a);
+    const double expected = (1 - a) * sums[0] / counts[0] + a * sums[1] / counts[1];
+    bent += bow * (lumas[t] / std::max(expected, 1.0) - 1);
+    bend += bow * bow;
+  }
+  return bend > 0 ? bent / bend : 0;
+}
+
 }  // namespace
 
 FrameParts PartsOf(const FrameDigest& digest, const FrameDetail& detail) {
@@ -120,7 +142,7 @@ ToneFit FitTone(const Ramp& ramp) {
   Pair straight;
   for (const double a : shares) straight.Add(1 - a, a);
   const auto n = static_cast<double>(shares.size());
-  double left = 0, all = 0, distance = 0, variances = 0, light = 0;
+  double left = 0, all = 0, distance = 0, variances = 0;
   for (std::size_t plane = 0; plane < 3; ++plane) {
     Pair::Ends sums, squares;
     for (std::size_t k = 0; k < kCount; ++k) {
@@ -143,20 +165,9 @@ ToneFit FitTone(const Ramp& ramp) {
     }
     variances += squares.first - sums.first * sums.first / kCount + squares.second -
                  sums.second * sums.second / kCount;
-    if (plane > 0) continue;
-    double bent = 0, bend = 0;
-    for (std::size_t t = 0; t < shares.size(); ++t) {
-      const double a = shares[t], bow = 4 * a * (1 - a);
-      const std::array<double, kCount>& lumas = ramp.frames[t]->tone[0];
-      const double luma = std::accumulate(lumas.begin(), lumas.end(), 0.0);
-      const double expected = (1 - a) * sums.first + a * sums.second;
-      bent += bow * (luma / std::max(expected, 1.0 * kCount) - 1);
-      bend += bow * bow;
-    }
-    if (bend > 0) light = bent / bend;
   }
   // A 255th of each part is as good as nothing.
-  return {1 - left / (all + n), distance / (variances + kCount), light};
+  return {1 - left / (all + n), distance / (variances + kCount), LightOf(ramp, shares)};
 }
 
 }  // namespace calmframe::host
