@@ -15,11 +15,10 @@ constexpr std::int64_t kLengths[] = {8,  9,  10, 11, 12, 14, 16, 18, 20,
 constexpr std::int64_t kLeastAside = 3, kMostAside = 8;
 
 // Where the figures come from: eighty dissolves of 8 to 40 frames between pieces of nine clips,
-// nearly all of them shaken; what comes nearest to one in ten clips without any, whole and at two
-// and three times their speed; and, drawn into these, 150 whip pans, pictures out of focus, lights
-// that go and come, and boards that pass.
+// nearly all of them shaken; ten clips without any, whole and at two and three times their speed;
+// and, drawn into these, 150 whip pans, blurs, lights that go and come, and boards that pass.
 //
-// DipFit. Evidence above which a span is looked at: below 0.1 in all but a few frames of the clips.
+// DipFit. Evidence above which a span is looked at: one in a hundred of the clips' has 0.07.
 constexpr double kWeak = 0.15;
 // What covariance and motion may take or add.
 constexpr double kDepth[2] = {0.7, 1.35};
@@ -27,17 +26,18 @@ constexpr double kDepth[2] = {0.7, 1.35};
 // up to what two scenes mostly have: of a part of a dissolve the dip may fit better than of the
 // whole, but its ends are nearer to each other.
 constexpr double kRankOfApart = 0.5, kApartEnough = 0.5;
-// A scene, and itself behind a short blur, have 0.33 at most.
+// Of a scene and itself behind a blur mostly less, of half of all dissolves above 1.5.
 constexpr double kFar = 0.35;
-// A walk to anywhere has 0.6 (of a random one the first principal component explains 6 / pi^2, and
-// is nearly a ramp), shaken pictures somewhat less, boards that pass 0.4 at most.
+// Of a random walk the first principal component, which is nearly a ramp, explains 6 / pi^2; of
+// pictures that are shaken besides a ramp has somewhat less, of boards that pass mostly below 0.4.
 constexpr double kStraight = 0.45;
 // Light that takes as much of the squares as a dip of the least depth, half of 0.7, takes the root
 // of it from the luma.
 constexpr double kLight = 0.19;
 // What the first leaves of the last, laid over it: the same scene, moved, is no other shot.
 constexpr double kApart = 0.5;
-// The evidence and the gain, see GainBetween, added.
+// The evidence and the gain, see GainBetween, added. Where there is no dissolve it is below 0.24 of
+// what all the other limits let through.
 constexpr double kStrong = 0.3;
 
 // How much of the detail of frames on the way a mixture of both ends explains that neither does by

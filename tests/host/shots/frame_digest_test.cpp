@@ -67,16 +67,16 @@ TEST(FrameDigestTest, CellsAreTheLumaOfTheirPartOfTheFrame) {
 
 TEST(FrameDigestTest, ColoursHaveTheirLumaAndChroma) {
   // .299, .587 and .114 of 200; .564 of blue less that, .713 of red less that.
-  struct Colour {
+  struct Painted {
     HX_Pixel8 pixel;
     int luma, blue, red;
   };
-  const Colour cases[] = {{{0, 200, 0, 0}, 60, -34, 100},
-                          {{255, 0, 200, 0}, 117, -66, -84},
-                          {{255, 0, 0, 200}, 23, 100, -16},
-                          {{255, 255, 0, 0}, 77, -43, 127},
-                          {{255, 255, 255, 0}, 226, -127, 21}};
-  for (const Colour& colour : cases) {
+  const Painted cases[] = {{{0, 200, 0, 0}, 60, -34, 100},
+                           {{255, 0, 200, 0}, 117, -66, -84},
+                           {{255, 0, 0, 200}, 23, 100, -16},
+                           {{255, 255, 0, 0}, 77, -43, 127},
+                           {{255, 255, 255, 0}, 226, -127, 21}};
+  for (const Painted& colour : cases) {
     // Grey to the right.
     PaddedFrame frame(40, 30, [&](int x, int) { return x < 20 ? colour.pixel : Grey(90); });
     const FrameDigest digest = DigestOf(frame.view());
