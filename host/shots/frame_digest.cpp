@@ -113,6 +113,8 @@ Cells Smoothed(const Cells& cells) {
 
 FrameDigest DigestOfCells(const Cells& cells) {
   FrameDigest digest;
+  digest.blue.fill(0);
+  digest.red.fill(0);
   digest.area = WithoutBars(cells);
   digest.cells = Smoothed(cells);
   for (int y = 0; y < FrameDigest::kHalfRows; ++y) {
@@ -139,12 +141,34 @@ FrameDigest DigestOf(const ArgbView& frame) {
   // 256ths of .299, .587 and .114.
   constexpr int kRed = 77, kGreen = 150, kBlue = 29;
   const auto* const top = reinterpret_cast<const std::uint8_t*>(frame.top_row);
-  return DigestOfCells(MeansOf(
-      frame.width, frame.height, kRed + kGreen + kBlue,
-      [&](int y) { return reinterpret_cast<const HX_Pixel8*>(top + y * frame.row_bytes); },
-      [](const HX_Pixel8* row, int x) {
-        return kRed * row[x].red + kGreen * row[x].green + kBlue * row[x].blue;
-      }));
+  const auto row_of = [&](int y) {
+    return reinterpret_cast<const HX_Pixel8*>(top + y * frame.row_bytes);
+  };
+  const auto luma_of = [](const HX_Pixel8* row, int x) {
+    return kRed * row[x].red + kGreen * row[x].green + kBlue * row[x].blue;
+  };
+  FrameDigest digest =
+      DigestOfCells(MeansOf(frame.width, frame.height, kRed + kGreen + kBlue, row_of, luma_of));
+  // Four pixels, in the middles of the four cells: shots are told apart by the colour of whole
+  // parts.
+  const auto columns = Places<kWide>(frame.width);
+  const auto rows = Places<kHigh>(frame.height);
+  for (std::size_t k = 0; k < digest.blue.size(); ++k) {
+    const std::size_t x = k % FrameDigest::kHalfColumns, y = k / FrameDigest::kHalfColumns;
+    int red = 0, blue = 0, luma = 0;
+    for (std::size_t i = 0; i < 4; ++i) {
+      const HX_Pixel8* const row = row_of(rows[2 * y + i / 2]);
+      const int column = columns[2 * x + i % 2];
+      red += row[column].red;
+      blue += row[column].blue;
+      luma += luma_of(row, column);
+    }
+    // 256ths of .564 and .713; the luma has 256ths already.
+    constexpr int kToBlue = 144, kToRed = 183;
+    digest.blue[k] = static_cast<std::int8_t>((kToBlue * (256 * blue - luma)) / (4 << 16));
+    digest.red[k] = static_cast<std::int8_t>((kToRed * (256 * red - luma)) / (4 << 16));
+  }
+  return digest;
 }
 
 FrameDigest DigestOf(const LumaView& frame) {

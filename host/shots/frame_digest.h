@@ -27,8 +27,8 @@ struct LumaView {
 // Of a picture of kind argb8, for as long as it lives.
 ArgbView ViewOf(const Picture& picture);
 
-// What the search for shots keeps of a frame: its luma in cells, some 3 KB. Alpha counts for
-// nothing. The same pixels give the same digest.
+// What the search for shots keeps of a frame: its luma in cells and its colours, some 4 KB. Alpha
+// counts for nothing. The same pixels give the same digest.
 struct FrameDigest {
   // As many cells in any frame: they are as wide as its 64th part, whatever its shape.
   static constexpr int kColumns = 64, kRows = 36;
@@ -45,6 +45,9 @@ struct FrameDigest {
   // a cell changes little. In `half` each cell is the mean of four.
   std::array<std::uint8_t, kColumns * kRows> cells;
   std::array<std::uint8_t, kHalfColumns * kHalfRows> half;
+  // Rec. 601 chroma as `half`, of few of the pixels: what is blue and what is red beyond grey, -128
+  // to 127. Nought of luma alone.
+  std::array<std::int8_t, kHalfColumns * kHalfRows> blue, red;
   // Without black bars along its edges. Empty: all of the frame is black.
   Area area;
 };

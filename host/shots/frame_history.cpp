@@ -48,9 +48,10 @@ void FrameHistory::Add(const FrameDigest& digest) {
   Entry& entry = entries_[static_cast<std::size_t>(end_) % entries_.size()];
   // Ahead of the entry, which is an old frame's.
   const FrameDigest::Area steady = SteadyArea(digest.area);
-  entry = Entry{digest, digest.area, {}, {}, {}, {}};
+  entry = Entry{digest, digest.area, {}, {}, {}, {}, {}};
   entry.digest.area = steady;
   entry.detail = DetailOf(entry.digest);
+  entry.parts = PartsOf(entry.digest, entry.detail);
   entry.tone = ToneOf(entry.digest);
   if (end_ > 0) {
     const Entry& before = At(end_ - 1);

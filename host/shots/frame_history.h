@@ -7,6 +7,7 @@
 #include "host/shots/digest_match.h"
 #include "host/shots/frame_digest.h"
 #include "host/shots/mixture.h"
+#include "host/shots/ramp_fit.h"
 
 namespace calmframe::host {
 
@@ -23,6 +24,7 @@ class FrameHistory {
 
   const FrameDigest& digest(std::int64_t frame) const { return At(frame).digest; }
   const FrameDetail& detail(std::int64_t frame) const { return At(frame).detail; }
+  const FrameParts& parts(std::int64_t frame) const { return At(frame).parts; }
   // From the frame before; nothing of the film's first and of frames that are not kept.
   DigestMatch match(std::int64_t frame) const {
     return Holds(frame) ? At(frame).match : DigestMatch{};
@@ -47,6 +49,7 @@ class FrameHistory {
     FrameDigest digest;      // with the area of the frames about it
     FrameDigest::Area area;  // its own
     FrameDetail detail;
+    FrameParts parts;
     DigestMatch match;
     CellShift place;  // the sum of the shifts so far
     Tone tone;

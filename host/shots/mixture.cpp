@@ -21,9 +21,7 @@ constexpr int kPartWide = kGridWide / kPartsAcross, kPartHigh = kGridHigh / kPar
 constexpr int kPartBeside = 2, kPartTried = 2 * kPartBeside + 1;
 // How far the frame as a whole is looked for, in cells of `half`.
 constexpr int kReachX = 8, kReachY = 5;
-// Detail is kept in quarters of a 255th. The square of a cell's that says nothing: noise, a coder.
-constexpr int kUnit = 4;
-constexpr double kNothing = kUnit * kUnit;
+constexpr double kNothing = FrameDetail::kNothing;
 
 Area Common(const Area& a, const Area& b) {
   return {std::max(a.left, b.left), std::max(a.top, b.top), std::min(a.right, b.right),
@@ -74,9 +72,6 @@ double SquareIn(const std::array<std::uint32_t, sums>& table, const Area& area) 
   };
   return at(area.right, area.bottom) - at(area.left, area.bottom) - at(area.right, area.top) +
          at(area.left, area.top);
-}
-double SquareIn(const FrameDetail& detail, const Area& area) {
-  return SquareIn<kGridWide>(detail.squares, area);
 }
 
 // The place of the whole frame, in cells, by correlation.
@@ -132,7 +127,7 @@ CellShift BestBeside(const std::int16_t* cells, const FrameDetail& other, const 
     const CellShift tried = shift + Trial(k);
     const double product = Products<kGridWide>(cells, other.cells.data(), seen, tried);
     if (!(product > 0)) continue;
-    const double square = SquareIn(other, At(seen, {-tried.x, -tried.y}));
+    const double square = other.SquareIn(At(seen, {-tried.x, -tried.y}));
     const double score = product * product / (square + kNothing * seen.size());
     if (score > most) {
       most = score;
@@ -167,11 +162,11 @@ Sums SumsOf(const std::vector<PartOfBoth>& parts, const FrameDetail& a, const Fr
   for (const PartOfBoth& part : parts) {
     const Area in_a = At(part.seen, {-part.a.x, -part.a.y});
     const Area in_b = At(part.seen, {-part.b.x, -part.b.y});
-    const double own = SquareIn(frame, part.seen);
+    const double own = frame.SquareIn(part.seen);
     const double weight = WeightOf(own, part.seen);
     sums.ff += weight * own;
-    sums.aa += weight * SquareIn(a, in_a);
-    sums.bb += weight * SquareIn(b, in_b);
+    sums.aa += weight * a.SquareIn(in_a);
+    sums.bb += weight * b.SquareIn(in_b);
     sums.fa += weight * Products<kGridWide>(f, p, part.seen, part.a);
     sums.fb += weight * Products<kGridWide>(f, q, part.seen, part.b);
     sums.ab += weight * Products<kGridWide>(p, q, in_a, part.b - part.a);
@@ -237,6 +232,10 @@ Weights Explain(const std::vector<Area>& seen, const FrameDetail& a, CellShift a
 
 }  // namespace
 
+double FrameDetail::SquareIn(const Area& within) const {
+  return host::SquareIn<kGridWide>(squares, within);
+}
+
 FrameDetail DetailOf(const FrameDigest& digest) {
   constexpr int kAbout = 4;  // cells to each side
   FrameDetail detail;
@@ -267,7 +266,8 @@ FrameDetail DetailOf(const FrameDigest& digest) {
       const auto k = static_cast<std::size_t>(y * kGridWide + x);
       // In quarters, so that faint pictures keep their shape; one part of the frame's sum of
       // products stays below 2^31.
-      detail.cells[k] = static_cast<std::int16_t>(std::lround(kUnit * (digest.cells[k] - mean)));
+      detail.cells[k] =
+          static_cast<std::int16_t>(std::lround(FrameDetail::kUnit * (digest.cells[k] - mean)));
     }
   }
   for (int y = 0; y < kHalfGridHigh; ++y) {
@@ -293,10 +293,10 @@ std::optional<Laid> Lay(const FrameDetail& other, const FrameDetail& frame, Cell
     const std::int16_t* const f = frame.cells.data();
     const std::int16_t* const o = other.cells.data();
     const CellShift best = BestBeside(f, other, seen, *place);
-    const double square = SquareIn(frame, seen);
+    const double square = frame.SquareIn(seen);
     const double weight = WeightOf(square, seen);
     own += weight * square;
-    others += weight * SquareIn(other, At(seen, {-best.x, -best.y}));
+    others += weight * other.SquareIn(At(seen, {-best.x, -best.y}));
     products += weight * Products<kGridWide>(f, o, seen, best);
   }
   laid.left = LeftBy(products, own, others);

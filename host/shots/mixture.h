@@ -14,6 +14,9 @@ namespace calmframe::host {
 // light and without what all pictures have alike, as a bright sky. Another scene's have nothing to
 // do with it. Nothing outside of the digest's area.
 struct FrameDetail {
+  // Cells are kept in quarters of a 255th. The square of one's that says nothing: noise, a coder.
+  static constexpr int kUnit = 4;
+  static constexpr double kNothing = kUnit * kUnit;
   std::array<std::int16_t, FrameDigest::kColumns * FrameDigest::kRows> cells;
   // The means of four, as FrameDigest::half.
   std::array<std::int16_t, FrameDigest::kHalfColumns * FrameDigest::kHalfRows> half;
@@ -23,8 +26,8 @@ struct FrameDetail {
   std::array<std::uint32_t, (FrameDigest::kColumns + 1) * (FrameDigest::kRows + 1)> squares;
   std::array<std::uint32_t, (FrameDigest::kHalfColumns + 1) * (FrameDigest::kHalfRows + 1)>
       half_squares;
-  // Of all cells.
-  double square() const { return squares.back(); }
+  // The sum over an area, of which nothing lies outside of the frame.
+  double SquareIn(const FrameDigest::Area& within) const;
 };
 FrameDetail DetailOf(const FrameDigest& digest);
 

@@ -65,13 +65,27 @@ TEST(FrameDigestTest, CellsAreTheLumaOfTheirPartOfTheFrame) {
   }
 }
 
-TEST(FrameDigestTest, ColoursHaveTheirLuma) {
-  // .299, .587 and .114 of 200.
-  const std::pair<HX_Pixel8, int> cases[] = {
-      {{0, 200, 0, 0}, 60}, {{255, 0, 200, 0}, 117}, {{255, 0, 0, 200}, 23}};
-  for (const auto& [pixel, luma] : cases) {
-    PaddedFrame frame(40, 30, [p = pixel](int, int) { return p; });
-    EXPECT_EQ(DigestOf(frame.view()).cells[500], luma);
+TEST(FrameDigestTest, ColoursHaveTheirLumaAndChroma) {
+  // .299, .587 and .114 of 200; .564 of blue less that, .713 of red less that.
+  struct Painted {
+    HX_Pixel8 pixel;
+    int luma, blue, red;
+  };
+  const Painted cases[] = {{{0, 200, 0, 0}, 60, -34, 100},
+                           {{255, 0, 200, 0}, 117, -66, -84},
+                           {{255, 0, 0, 200}, 23, 100, -16},
+                           {{255, 255, 0, 0}, 77, -43, 127},
+                           {{255, 255, 255, 0}, 226, -127, 21}};
+  for (const Painted& colour : cases) {
+    // Grey to the right.
+    PaddedFrame frame(40, 30, [&](int x, int) { return x < 20 ? colour.pixel : Grey(90); });
+    const FrameDigest digest = DigestOf(frame.view());
+    EXPECT_EQ(digest.cells[460], colour.luma);
+    const std::size_t left = 10 * FrameDigest::kHalfColumns + 15;
+    EXPECT_NEAR(digest.blue[left], colour.blue, 1) << colour.luma;
+    EXPECT_NEAR(digest.red[left], colour.red, 1) << colour.luma;
+    EXPECT_NEAR(digest.blue[left + 1], 0, 1);
+    EXPECT_NEAR(digest.red[left + 1], 0, 1);
   }
 }
 
