@@ -118,8 +118,14 @@ nlohmann::ordered_json JsonOfBytes(const std::string& bytes) {
 
 std::string BytesOf(const nlohmann::ordered_json& json) {
   if (!json.is_array()) return json.get<std::string>();
-  const auto bytes = json.get<std::vector<std::uint8_t>>();
-  return {bytes.begin(), bytes.end()};
+  std::string bytes;
+  for (const auto& byte : json) bytes.push_back(static_cast<char>(WholeOf(byte)));
+  return bytes;
+}
+
+std::int64_t WholeOf(const nlohmann::ordered_json& json) {
+  if (json.is_number_integer()) return json.get<std::int64_t>();
+  throw nlohmann::json::type_error::create(302, "a whole number is wanted", nullptr);
 }
 
 }  // namespace calmframe::batch

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <nlohmann/json_fwd.hpp>
 #include <string>
 
@@ -25,5 +26,9 @@ std::string Shown(const std::string& name);
 nlohmann::ordered_json JsonOfBytes(const std::string& bytes);
 // Throws nlohmann::json::exception.
 std::string BytesOf(const nlohmann::ordered_json& json);
+
+// Throws nlohmann::json::exception for what is no whole number, which a conversion would make one
+// of in ways that are not defined.
+std::int64_t WholeOf(const nlohmann::ordered_json& json);
 
 }  // namespace calmframe::batch

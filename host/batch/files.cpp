@@ -13,6 +13,7 @@
 #include <system_error>
 
 #include "host/base/json_depth.h"
+#include "host/batch/clip_names.h"
 #include "host/media/output_file.h"
 
 namespace calmframe::batch {
@@ -34,7 +35,7 @@ nlohmann::ordered_json JsonOf(const FileIdentity& identity) {
 }
 
 FileIdentity IdentityOf(const nlohmann::ordered_json& json) {
-  return {json.at("size").get<std::int64_t>(), json.at("modified").get<std::int64_t>()};
+  return {WholeOf(json.at("size")), WholeOf(json.at("modified"))};
 }
 
 bool WriteWhole(const std::string& path, const std::string& text) {

@@ -228,7 +228,7 @@ Plan PlanOf(const std::string& text) {
     task.source = BytesOf(entry.at("source"));
     task.output = BytesOf(entry.at("output"));
     task.cost = entry.at("cost").get<double>();
-    task.memory = entry.at("memory").get<std::int64_t>();
+    task.memory = WholeOf(entry.at("memory"));
     if (entry.contains("words")) {
       for (const auto& word : entry.at("words")) task.words.push_back(BytesOf(word));
       task.is_piece = entry.at("is_piece").get<bool>();

@@ -38,7 +38,7 @@ std::optional<Record> RecordOf(const nlohmann::ordered_json& json) {
     record.output_identity = IdentityOf(json.at("output_identity"));
   }
   record.error = json.value("error", "");
-  record.exit_code = json.at("exit_code").get<int>();
+  record.exit_code = static_cast<int>(WholeOf(json.at("exit_code")));
   record.seconds = json.at("seconds").get<double>();
   if (json.contains("outcome")) record.outcome = json.at("outcome");
   record.warnings = ListOf(json.at("warnings"));

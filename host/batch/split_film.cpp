@@ -81,8 +81,8 @@ class SplitFilm {
     // Of a process that reads what strangers made.
     bool is_a_film = true;
     for (const auto& shot : json->at("shots")) {
-      const Stretch told{shot.at("first_frame").get<std::size_t>(),
-                         shot.at("end_frame").get<std::size_t>()};
+      const Stretch told{static_cast<std::size_t>(WholeOf(shot.at("first_frame"))),
+                         static_cast<std::size_t>(WholeOf(shot.at("end_frame")))};
       is_a_film = is_a_film && told.first < told.end && told.end <= kMostFrames &&
                   (shots_.empty() || told.first == shots_.back().end);
       shots_.push_back(told);

@@ -116,7 +116,9 @@ void Clip::Take(Message message) {
     surroundings_.changed(id_, ClipSurroundings::When::now);
     return;
   }
-  const auto waiting = waiting_.find(message.head.value("id", std::uint64_t{0}));
+  const auto id = message.head.find("id");
+  if (id == message.head.end() || !id->is_number_unsigned()) throw BadMessage("an answer to none");
+  const auto waiting = waiting_.find(id->get<std::uint64_t>());
   if (waiting == waiting_.end()) return;
   const Reply reply = std::move(waiting->second);
   waiting_.erase(waiting);

@@ -252,6 +252,10 @@ TEST_F(BatchPlanTest, APlanIsReadAsItWasWritten) {
   EXPECT_EQ(read.tasks[1].source, plan.tasks[1].source);
   EXPECT_EQ(read.tasks[1].output, plan.tasks[1].output);
   EXPECT_EQ(read.tasks[1].memory, plan.tasks[1].memory);
+  std::string text = TextOf(plan);
+  const std::string number = std::to_string(plan.tasks[1].memory);
+  text.replace(text.find(number), number.size(), "1e300");
+  EXPECT_THROW(PlanOf(text), nlohmann::json::exception);
   EXPECT_EQ(TextOf(read), TextOf(plan));
   EXPECT_THROW(PlanOf("{}"), nlohmann::json::exception);
 }
