@@ -1,5 +1,7 @@
 #include "host/project/sqlite.h"
 
+#include <new>
+
 namespace calmframe::host {
 namespace {
 
@@ -14,7 +16,7 @@ void CheckCode(sqlite3* database, int code) {
 // opened and then removed. None of ours does, and a stranger's may name any file there is.
 class OwnFiles {
  public:
-  OwnFiles() : files_(*sqlite3_vfs_find(nullptr)) {
+  OwnFiles() : files_(FilesOfSystem()) {
     open_of_system = files_.xOpen;
     files_.zName = kName;
     files_.xOpen = [](sqlite3_vfs* own, const char* name, sqlite3_file* file, int flags,
@@ -25,7 +27,7 @@ class OwnFiles {
       file->pMethods = nullptr;
       return SQLITE_CORRUPT;
     };
-    sqlite3_vfs_register(&files_, 0);
+    if (sqlite3_vfs_register(&files_, 0) != SQLITE_OK) throw std::bad_alloc();
   }
   // With the library that this is a part of.
   ~OwnFiles() { sqlite3_vfs_unregister(&files_); }
@@ -35,6 +37,13 @@ class OwnFiles {
   static constexpr char kName[] = "calmframe";
 
  private:
+  // There are none where SQLite had no memory to begin with.
+  static const sqlite3_vfs& FilesOfSystem() {
+    const sqlite3_vfs* const files = sqlite3_vfs_find(nullptr);
+    if (!files) throw std::bad_alloc();
+    return *files;
+  }
+
   static inline decltype(sqlite3_vfs::xOpen) open_of_system = nullptr;
   sqlite3_vfs files_;
 };
