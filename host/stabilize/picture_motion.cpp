@@ -116,7 +116,7 @@ PictureMotion FindMotion(const WarpedPlane& plane) {
       if (first + i >= 2) {
         motion.wobble[first + i - 1] = Flicker(before_last_cells, last_cells, cells[i]);
       }
-      before_last_cells = std::exchange(last_cells, std::move(cells[i]));
+      before_last_cells = std::exchange(last_cells, cells[i]);
     }
     last = std::move(rows.back());
   }
