@@ -142,11 +142,15 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
   for (Camera& camera : shake) {
     camera = {(random() % 100) * 0.06, (random() % 100) * 0.06, (random() % 100) * 0.0002};
   }
-  MakeWall("in.mkv", Made(160, 120, 80, 25), [&](double time) {
+  const auto camera_at = [&](double time) {
     Camera camera = shake[static_cast<std::size_t>(time)];
     camera.x += 12 * std::min(std::abs(time - 40), 30.0);
     return camera;
-  });
+  };
+  // libx264's pixels may differ from run to run, and the last run's zoom is near its limit.
+  media::EncodeSettings lossless;
+  lossless.codec = "ffv1";
+  MakeWall("in.mkv", Made(160, 120, 80, 25), camera_at, lossless);
   struct Run {
     std::string flags, what;
     double most_zoom;
@@ -183,8 +187,8 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
   RunWell("render --project p.calm out.y4m --quiet --overwrite --threads 2");
   EXPECT_TRUE(Content("out.y4m") == filled);
   EXPECT_FALSE(content("--framing synthesize-edges --window steady") == filled);
-  ExpectLine("stabilize in.mkv x.mkv --quiet --window follow --framing stabilize-only", 2,
-             "needs --framing crop-auto-scale");
+  ExpectLine("stabilize in.mkv x.mkv --codec ffv1 --quiet --window follow --framing stabilize-only",
+             2, "needs --framing crop-auto-scale");
 }
 
 // A camera on a tripod can't be calmed, and its frames come out whole, to their edges.
