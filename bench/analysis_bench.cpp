@@ -243,8 +243,8 @@ struct Step {
     return params;
   }
   void Track() {
-    tracker.TrackAndVerify(pyramids[0], pyramids[1], seeds.data(), moved.data(), 0, seeds.size(),
-                           workspace, statistics);
+    tracker.TrackAndVerify(pyramids[0], pyramids[1], seeds.data(), moved.data(), seeds.size(),
+                           statistics);
   }
   void Peer() {
     OpticalFlow(Input().grey[0], Input().grey[1], params, points, moved_points, found);
@@ -259,7 +259,6 @@ struct Step {
 
   TrackerParams params;
   FeatureTracker tracker;
-  FeatureTracker::Workspace workspace = tracker.MakeWorkspace();
   std::vector<tracking_feature<float>> seeds, moved;
   std::vector<ImagePyramid> pyramids;
   TrackingStatistics statistics;

@@ -82,9 +82,7 @@ struct Clip {
   }
 
   void Track(FeatureTracker& tracker, std::vector<tracking_feature<float>>& row) {
-    FeatureTracker::Workspace workspace = tracker.MakeWorkspace();
-    tracker.TrackAndVerify(previous, current, seeds.data(), row.data(), 0, seeds.size(), workspace,
-                           statistics);
+    tracker.TrackAndVerify(previous, current, seeds.data(), row.data(), seeds.size(), statistics);
   }
 
   std::size_t width, height;

@@ -18,8 +18,7 @@ void Count(std::vector<std::size_t>& histogram, std::size_t counter) {
 // Most features are found on the finest level alone, so levels of the template are sampled and
 // their matrices formed when an attempt first reaches them.
 struct FeatureTracker::translation_stage {
-  const FeatureTracker& tracker;
-  Workspace& workspace;
+  FeatureTracker& tracker;
   const ImagePyramid& previous;
   const ImagePyramid& current;
   float x, y;
@@ -29,34 +28,33 @@ struct FeatureTracker::translation_stage {
 
   void SampleTo(std::size_t level) {
     for (; levels_sampled <= level; ++levels_sampled) {
-      ExtractWindowLevel(levels_sampled, x, y, previous, workspace.translation_stack);
+      ExtractWindowLevel(levels_sampled, x, y, previous, tracker.translation_stack_);
     }
   }
 
   int Solve(std::size_t level, AffineState& state) {
     SampleTo(level);
-    const float* t = workspace.translation_stack.Level(level);
+    const float* t = tracker.translation_stack_.Level(level);
     for (; levels_prepared <= level; ++levels_prepared) {
-      translation_level& next = workspace.translation_levels[levels_prepared];
-      next.singular = !PrepareTranslation(workspace.translation_stack.Level(levels_prepared),
+      translation_level& next = tracker.translation_levels_[levels_prepared];
+      next.singular = !PrepareTranslation(tracker.translation_stack_.Level(levels_prepared),
                                           tracker.shape_, mode, next.normal);
     }
-    const translation_level& prepared = workspace.translation_levels[level];
+    const translation_level& prepared = tracker.translation_levels_[level];
     if (prepared.singular) return kLevelFailed;
     return SolveTranslation(t, tracker.shape_, prepared.normal, current.Level(level), mode,
                             tracker.tolerances_, tracker.max_iterations_, state,
-                            workspace.sample.Level(0));
+                            tracker.sample_.Level(0));
   }
 
   float Correlation(std::size_t level) {
-    return NormalisedCorrelation(tracker.shape_, workspace.translation_stack.Level(level),
-                                 workspace.sample.Level(0));
+    return NormalisedCorrelation(tracker.shape_, tracker.translation_stack_.Level(level),
+                                 tracker.sample_.Level(0));
   }
 };
 
 struct FeatureTracker::affine_stage {
-  const FeatureTracker& tracker;
-  Workspace& workspace;
+  FeatureTracker& tracker;
   const ImagePyramid& current;
   feature_slot& slot;
   color_mode mode;
@@ -74,7 +72,7 @@ struct FeatureTracker::affine_stage {
     if (cached.normal_state == readiness::singular) return kLevelFailed;
     return SolveAffine(t, tracker.shape_, cached.normal, current.Level(level), mode,
                        tracker.tolerances_, tracker.max_iterations_, state,
-                       workspace.sample.Level(0));
+                       tracker.sample_.Level(0));
   }
 
   float Correlation(std::size_t level) {
@@ -84,7 +82,7 @@ struct FeatureTracker::affine_stage {
       cached.moments = ChannelMoments(t, tracker.shape_);
       cached.has_moments = true;
     }
-    return NormalisedCorrelation(tracker.shape_, t, cached.moments, workspace.sample.Level(0));
+    return NormalisedCorrelation(tracker.shape_, t, cached.moments, tracker.sample_.Level(0));
   }
 };
 
@@ -102,7 +100,10 @@ FeatureTracker::FeatureTracker(const TrackerParams& params, std::size_t feature_
                   static_cast<float>(params.tolerance_affine),
                   static_cast<float>(params.tolerance_color_lambda),
                   static_cast<float>(params.tolerance_color_delta)},
-      shape_{params.half_win_x, params.half_win_x, channels} {
+      shape_{params.half_win_x, params.half_win_x, channels},
+      sample_(shape_.half_x, shape_.half_y, channels, 1),
+      translation_stack_(shape_.half_x, shape_.half_y, channels, levels_),
+      translation_levels_(levels_) {
   if (!verification_) return;
   slots_.resize(feature_count);
   for (feature_slot& slot : slots_) {
@@ -121,31 +122,22 @@ void FeatureTracker::SetStates(const std::vector<AffineState>& states) {
   for (std::size_t s = 0; s < slots_.size(); ++s) slots_[s].state = states.at(s);
 }
 
-FeatureTracker::Workspace FeatureTracker::MakeWorkspace() const {
-  Workspace workspace;
-  workspace.sample = WindowStack(shape_.half_x, shape_.half_y, shape_.channels, 1);
-  workspace.translation_stack = WindowStack(shape_.half_x, shape_.half_y, shape_.channels, levels_);
-  workspace.translation_levels.resize(levels_);
-  return workspace;
-}
-
 void FeatureTracker::TrackAndVerify(const ImagePyramid& previous, const ImagePyramid& current,
                                     const tracking_feature<float>* previous_row,
-                                    tracking_feature<float>* current_row, std::size_t first,
-                                    std::size_t end, Workspace& workspace,
+                                    tracking_feature<float>* current_row, std::size_t feature_count,
                                     TrackingStatistics& statistics) {
-  for (std::size_t s = first; s < end; ++s) {
-    TrackSlot(previous, current, previous_row[s], current_row[s], workspace, statistics);
-    if (verification_) VerifySlot(current, slots_[s], current_row[s], workspace, statistics);
+  for (std::size_t s = 0; s < feature_count; ++s) {
+    TrackSlot(previous, current, previous_row[s], current_row[s], statistics);
+    if (verification_) VerifySlot(current, slots_[s], current_row[s], statistics);
   }
 }
 
 void FeatureTracker::TrackSlot(const ImagePyramid& previous, const ImagePyramid& current,
                                const tracking_feature<float>& from, tracking_feature<float>& to,
-                               Workspace& workspace, TrackingStatistics& statistics) {
+                               TrackingStatistics& statistics) {
   if (from.status < 0) {
     to.status = feature_status::kEmpty;
-  } else if (TrackFeature(previous, current, from, to, workspace, statistics)) {
+  } else if (TrackFeature(previous, current, from, to, statistics)) {
     to.status = feature_status::kTracked;
   } else {
     to.status = feature_status::kLost;
@@ -155,11 +147,11 @@ void FeatureTracker::TrackSlot(const ImagePyramid& previous, const ImagePyramid&
 
 bool FeatureTracker::TrackFeature(const ImagePyramid& previous, const ImagePyramid& current,
                                   const tracking_feature<float>& from, tracking_feature<float>& to,
-                                  Workspace& workspace, TrackingStatistics& statistics) {
-  WindowStack& stack = workspace.translation_stack;
+                                  TrackingStatistics& statistics) {
+  WindowStack& stack = translation_stack_;
   stack.levels_built = CountWindowLevels(levels_, from.x, from.y, shape_, previous);
   if (stack.levels_built == 0) return false;
-  translation_stage stage{*this, workspace, previous, current, from.x, from.y, translation_mode_};
+  translation_stage stage{*this, previous, current, from.x, from.y, translation_mode_};
   stage.SampleTo(0);
   float limit = min_correlation_;
   if (FindPrimaryChannel(stack.Level(0), shape_, dark_threshold_) != 0) {
@@ -194,22 +186,20 @@ void FeatureTracker::InitialiseSeeds(const ImagePyramid& current,
 }
 
 void FeatureTracker::VerifySlot(const ImagePyramid& current, feature_slot& slot,
-                                tracking_feature<float>& cell, Workspace& workspace,
-                                TrackingStatistics& statistics) {
+                                tracking_feature<float>& cell, TrackingStatistics& statistics) {
   if (cell.status != feature_status::kTracked) return;
   slot.state.dx = cell.x - slot.state.x;
   slot.state.dy = cell.y - slot.state.y;
   const float limit = slot.primary_channel != 0 ? kAnyCorrelation : min_correlation_;
-  if (VerifyFeature(current, slot, limit, cell, workspace, statistics)) return;
+  if (VerifyFeature(current, slot, limit, cell, statistics)) return;
   cell.status =
       limit > cell.correlation ? feature_status::kRejectedCorrelation : feature_status::kRejected;
   Count(statistics.verification, 0);
 }
 
 bool FeatureTracker::VerifyFeature(const ImagePyramid& current, feature_slot& slot, float limit,
-                                   tracking_feature<float>& cell, Workspace& workspace,
-                                   TrackingStatistics& statistics) {
-  affine_stage stage{*this, workspace, current, slot,
+                                   tracking_feature<float>& cell, TrackingStatistics& statistics) {
+  affine_stage stage{*this, current, slot,
                      slot.primary_channel != 0 ? color_mode::none : affine_mode_};
   const search_result result = SearchPyramid(
       stage, std::min(slot.stack.levels_built, current.levels), limit, max_iterations_, slot.state);

@@ -18,24 +18,10 @@ namespace marrow::tracking {
 // Carries features from frame to frame (Lucas and Kanade 1981, in the inverse-compositional form of
 // Baker and Matthews 2004), then judges each against the window it showed in its first frame
 // (Shi and Tomasi 1994), so that the errors of the steps do not add up. Windows are square, of
-// half_win_x. Everything is allocated at construction. Rows are feature_count cells of the track
-// table.
+// half_win_x. One thread; everything is allocated at construction. Rows are feature_count cells of
+// the track table.
 class FeatureTracker {
-  // What depends on one level of a template alone, computed when it is first needed.
-  struct translation_level {
-    bool singular = false;
-    translation_normal normal;
-  };
-
  public:
-  // Where one feature after the other is worked.
-  class Workspace {
-    friend class FeatureTracker;
-    WindowStack sample;  // of one level: the last sample
-    WindowStack translation_stack;
-    std::vector<translation_level> translation_levels;
-  };
-
   FeatureTracker(const TrackerParams& params, std::size_t feature_count, std::size_t channels);
 
   // Keeps what the slots of all seeds (status above 0) show in their first frame.
@@ -47,25 +33,26 @@ class FeatureTracker {
   std::vector<AffineState> States() const;
   void SetStates(const std::vector<AffineState>& states);
 
-  Workspace MakeWorkspace() const;
-
-  // Follows each feature that lives in previous_row, for the slots [first, end): writes x, y and
-  // status kTracked to current_row, or status kLost; for the other slots status kEmpty. Counts into
-  // statistics.translation.
+  // Follows each feature that lives in previous_row, for the first feature_count slots: writes x, y
+  // and status kTracked to current_row, or status kLost; for the other slots status kEmpty. Counts
+  // into statistics.translation.
   // What was tracked is then verified: the slot's first window is matched against this frame,
   // starting at the cell's position with the warp and colours of the frame before. Writes x, y and
   // correlation, or status kRejected (the correlation in the cell is not under the limit) or
   // kRejectedCorrelation. Counts into statistics.verification. Slot by slot, so that a feature's
-  // second match finds the pixels of its first one in the cache. Other threads may work other slots
-  // in the meantime, with a workspace and statistics of their own: no slot knows of another.
+  // second match finds the pixels of its first one in the cache.
   void TrackAndVerify(const ImagePyramid& previous, const ImagePyramid& current,
                       const tracking_feature<float>* previous_row,
-                      tracking_feature<float>* current_row, std::size_t first, std::size_t end,
-                      Workspace& workspace, TrackingStatistics& statistics);
+                      tracking_feature<float>* current_row, std::size_t feature_count,
+                      TrackingStatistics& statistics);
 
  private:
-  // As of translation_level.
+  // What depends on one level of a template alone, computed when it is first needed.
   enum class readiness : unsigned char { unknown, ready, singular };
+  struct translation_level {
+    bool singular = false;
+    translation_normal normal;
+  };
   struct affine_level {
     readiness normal_state = readiness::unknown;
     bool has_moments = false;
@@ -83,15 +70,14 @@ class FeatureTracker {
 
   void TrackSlot(const ImagePyramid& previous, const ImagePyramid& current,
                  const tracking_feature<float>& from, tracking_feature<float>& to,
-                 Workspace& workspace, TrackingStatistics& statistics);
+                 TrackingStatistics& statistics);
   void VerifySlot(const ImagePyramid& current, feature_slot& slot, tracking_feature<float>& cell,
-                  Workspace& workspace, TrackingStatistics& statistics);
+                  TrackingStatistics& statistics);
   bool TrackFeature(const ImagePyramid& previous, const ImagePyramid& current,
                     const tracking_feature<float>& from, tracking_feature<float>& to,
-                    Workspace& workspace, TrackingStatistics& statistics);
+                    TrackingStatistics& statistics);
   bool VerifyFeature(const ImagePyramid& current, feature_slot& slot, float limit,
-                     tracking_feature<float>& cell, Workspace& workspace,
-                     TrackingStatistics& statistics);
+                     tracking_feature<float>& cell, TrackingStatistics& statistics);
 
   std::size_t levels_;
   int max_iterations_;
@@ -102,6 +88,9 @@ class FeatureTracker {
   float dark_threshold_;
   solver_tolerances tolerances_;
   window_shape shape_;
+  WindowStack sample_;  // of one level: the last sample
+  WindowStack translation_stack_;
+  std::vector<translation_level> translation_levels_;
   std::vector<feature_slot> slots_;  // empty without verification
 };
 

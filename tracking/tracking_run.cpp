@@ -1,13 +1,10 @@
 #include "tracking/tracking_run.h"
 
 #include <algorithm>
-#include <atomic>
 #include <map>
 #include <stdexcept>
-#include <thread>
 #include <utility>
 
-#include "platform/tessel/threads.h"
 #include "tracking/feature_selector.h"
 #include "tracking/feature_tracker.h"
 #include "tracking/image_pyramid.h"
@@ -16,10 +13,6 @@ namespace marrow::tracking {
 namespace {
 
 constexpr std::size_t kChannels = 3;
-// Processors that a run has use for: what they share takes a fifth of a frame's time.
-constexpr unsigned kMostLanes = 16;
-// Slots that one takes at a time: some 0.2 ms.
-constexpr std::size_t kSlotsAtOnce = 16;
 
 // The selected features go into the slots without a live one, from slot 0 upward.
 std::size_t FillSlots(const std::vector<FeatureSelector::Feature>& selected,
@@ -34,10 +27,6 @@ std::size_t FillSlots(const std::vector<FeatureSelector::Feature>& selected,
   return next;
 }
 
-void Add(const std::vector<std::size_t>& counted, std::vector<std::size_t>& histogram) {
-  for (std::size_t i = 0; i < histogram.size(); ++i) histogram[i] += counted[i];
-}
-
 // A run with all that it needs from row to row.
 class Run {
  public:
@@ -49,26 +38,30 @@ class Run {
         levels_(tracker_params.pyramidal_levels),
         selector_(selector_params),
         tracker_(tracker_params, slots_, kChannels),
-        lanes_(std::clamp(std::thread::hardware_concurrency(), 1u, kMostLanes)),
         previous_(source.width(), source.height(), kChannels, levels_, source.first_level()),
         current_(source.width(), source.height(), kChannels, levels_, source.first_level()) {
     selector_.Configure(source.width(), source.height());
-    for (Lane& lane : lanes_) lane.workspace = tracker_.MakeWorkspace();
   }
 
   TrackingStatistics Row(std::size_t t) {
     tracking_feature<float>* const row = RowOf(t);
     std::fill_n(row, slots_, tracking_feature<float>{});
-    TrackingStatistics frame = NothingCounted();
-    if (t > 0) source_.LoadColorPyramid(t, current_, scratch_);
-    source_.LoadLuma(t, selector_.luma());
-    source_.LoadMask(t, selector_.mask());
+    TrackingStatistics frame{0, std::vector<std::size_t>(levels_ + 1),
+                             std::vector<std::size_t>(levels_ + 1)};
+    const auto load_candidates = [&] {
+      source_.LoadLuma(t, selector_.luma());
+      source_.LoadMask(t, selector_.mask());
+      selector_.ComputeCandidates();
+    };
+
     if (t == 0) {
       for (std::size_t s = 0; s < slots_; ++s) row[s].status = feature_status::kEmpty;
-      selector_.ComputeCandidates();
+      load_candidates();
       selector_.SelectFirst();
     } else {
-      TrackAndFindCandidates(row, frame);
+      source_.LoadColorPyramid(t, current_, scratch_);
+      tracker_.TrackAndVerify(previous_, current_, row - slots_, row, slots_, frame);
+      load_candidates();
       const auto free_slots = static_cast<std::size_t>(
           std::count_if(row, row + slots_, [](const auto& cell) { return cell.status < 0; }));
       selector_.SelectAvoiding(row, slots_, free_slots);
@@ -112,42 +105,6 @@ class Run {
   }
 
  private:
-  // What one processor needs for itself.
-  struct Lane {
-    FeatureTracker::Workspace workspace;
-    TrackingStatistics counted;
-  };
-
-  TrackingStatistics NothingCounted() const {
-    return {0, std::vector<std::size_t>(levels_ + 1), std::vector<std::size_t>(levels_ + 1)};
-  }
-
-  // From the row before into this one, on all processors. The frame's candidates are sought beside
-  // it, as one more piece: no piece knows of another, so the result is that of one after the other.
-  void TrackAndFindCandidates(tracking_feature<float>* row, TrackingStatistics& frame) {
-    const std::size_t pieces = 1 + (slots_ + kSlotsAtOnce - 1) / kSlotsAtOnce;
-    std::atomic<std::size_t> next = 0;
-    const auto work = [&](std::size_t lane_index) {
-      Lane& lane = lanes_[lane_index];
-      lane.counted = NothingCounted();
-      for (std::size_t piece; (piece = next++) < pieces;) {
-        if (piece == 0) {
-          selector_.ComputeCandidates();  // the longest
-          continue;
-        }
-        const std::size_t first = (piece - 1) * kSlotsAtOnce;
-        tracker_.TrackAndVerify(previous_, current_, row - slots_, row, first,
-                                std::min(first + kSlotsAtOnce, slots_), lane.workspace,
-                                lane.counted);
-      }
-    };
-    tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(work, lanes_.size());
-    for (const Lane& lane : lanes_) {
-      Add(lane.counted.translation, frame.translation);
-      Add(lane.counted.verification, frame.verification);
-    }
-  }
-
   tracking_feature<float>* RowOf(std::size_t t) { return table_.features->data() + t * slots_; }
 
   FrameSource& source_;
@@ -156,7 +113,6 @@ class Run {
   const std::size_t levels_;
   FeatureSelector selector_;
   FeatureTracker tracker_;
-  std::vector<Lane> lanes_;
   ImagePyramid previous_, current_;
   std::vector<float> scratch_;
 };

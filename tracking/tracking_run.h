@@ -37,9 +37,8 @@ class RunWatcher {
 
 // Fills a table of source.frame_count() rows and selector.max_count slots, row after row, then
 // removes short tracks. all_features is given its final dimensions before the first frame is read,
-// so that another holder of the header sees a table that fills from the top. The source is called
-// on the caller's thread; features are followed on all processors. Exceptions of the source pass
-// through.
+// so that another holder of the header sees a table that fills from the top. One thread, one
+// feature after the other. Exceptions of the source pass through.
 void TrackFrames(FrameSource& source, const SelectorParams& selector, const TrackerParams& tracker,
                  AllFeatures& all_features, std::vector<TrackingStatistics>* statistics = nullptr,
                  RunWatcher* watcher = nullptr);

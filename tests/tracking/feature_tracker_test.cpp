@@ -50,14 +50,13 @@ struct Follower {
   Cell Follow(const ImagePyramid& first, const ImagePyramid& second, float x, float y) {
     from[0] = {x, y, 1, 0};
     to[0] = {};
-    tracker.TrackAndVerify(first, second, from.data(), to.data(), 0, 1, workspace, statistics);
+    tracker.TrackAndVerify(first, second, from.data(), to.data(), 1, statistics);
     return to[0];
   }
   // What verification says of a seed that came to (x, y) of a frame.
   Cell Verify(const ImagePyramid& frame, float x, float y) { return Follow(frame, frame, x, y); }
 
   FeatureTracker tracker;
-  FeatureTracker::Workspace workspace = tracker.MakeWorkspace();
   std::vector<Cell> from, to;
   TrackingStatistics statistics;
 };
@@ -113,8 +112,7 @@ TEST(TranslationStageTest, DeadCellsStayEmptyAndLiveOnesAreFollowed) {
       run.from[s].status = before[s];
       run.to[s] = {-5, -6, 99, 0.25f};
     }
-    run.tracker.TrackAndVerify(still, still, run.from.data(), run.to.data(), 0, 8, run.workspace,
-                               run.statistics);
+    run.tracker.TrackAndVerify(still, still, run.from.data(), run.to.data(), 8, run.statistics);
     for (int s = 0; s < 8; ++s) {
       const bool live = before[s] >= 0;
       EXPECT_EQ(run.to[s].status, live ? feature_status::kTracked : feature_status::kEmpty);
