@@ -10,7 +10,7 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/stabilize_command.h"
-#include "host/batch/clip_names.h"
+#include "host/base/shown_text.h"
 #include "host/stabilize/framing.h"
 #include "host/stabilize/steady_clip.h"
 #include "platform/tessel/threads.h"
@@ -110,7 +110,7 @@ void AnalyzeCommand::Analyze(host::Opening opening, ProgressLine& progress) cons
     std::printf("%s\n", JsonLine(json).c_str());
     return file.Throw();
   }
-  std::printf("%s: %zu %s of %dx%d\n", batch::Shown(input_).c_str(), info.frame_count,
+  std::printf("%s: %zu %s of %dx%d\n", Shown(input_).c_str(), info.frame_count,
               info.frame_count == 1 ? "frame" : "frames", info.width, info.height);
   for (std::size_t s = 0; s < shots.size(); ++s) {
     if (shots.size() > 1) {

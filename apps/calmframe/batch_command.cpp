@@ -17,6 +17,7 @@
 #include "apps/calmframe/plugin_path.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/thumbnails.h"
+#include "host/base/shown_text.h"
 #include "host/batch/clip_names.h"
 #include "host/batch/clip_search.h"
 #include "host/batch/local_batch.h"
@@ -46,7 +47,7 @@ std::string MadeFolder(const std::string& path) {
   } catch (const std::system_error& error) {
     cause = error.code().message();
   }
-  throw media::Failure(media::Failure::Side::output, batch::Shown(path) + ": " + cause);
+  throw media::Failure(media::Failure::Side::output, Shown(path) + ": " + cause);
 }
 
 // What is wrong with them would be wrong for each clip.
@@ -177,7 +178,7 @@ std::vector<std::string> BatchCommand::Settings() const {
 void BatchCommand::Run() {
   ProgressLine progress(run_.progress_form());
   if (const std::string trouble = batch::TemplateTrouble(name_); !trouble.empty()) {
-    throw UsageFailure("--name " + batch::Shown(trouble));
+    throw UsageFailure("--name " + Shown(trouble));
   }
   CheckParams(controls_);
   const batch::FoundClips found = batch::FindClips(inputs_, recursive_);

@@ -10,7 +10,7 @@
 #include <nlohmann/json.hpp>
 
 #include "apps/report/batch_page.h"
-#include "host/batch/clip_names.h"
+#include "host/base/shown_text.h"
 #include "host/media/clip.h"
 #include "host/media/output_file.h"
 
@@ -18,7 +18,6 @@ namespace calmframe {
 namespace {
 
 using State = batch::TaskResult::State;
-using batch::Shown;
 
 constexpr char kPage[] = "batch.html";
 

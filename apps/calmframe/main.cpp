@@ -36,7 +36,7 @@
 #include "apps/calmframe/stabilize_command.h"
 #include "apps/calmframe/studio_command.h"
 #include "host/base/nearest_match.h"
-#include "host/batch/clip_names.h"
+#include "host/base/shown_text.h"
 #include "host/media/clip.h"
 
 namespace calmframe {
@@ -82,7 +82,7 @@ int Fail(ExitCode code, const std::string& line, bool json = false) {
     const nlohmann::ordered_json object = {{"error", line}, {"exit_code", code}};
     std::fprintf(stderr, "%s\n", JsonLine(object).c_str());
   } else {
-    std::fprintf(stderr, "calmframe: %s\n", batch::Shown(line).c_str());
+    std::fprintf(stderr, "calmframe: %s\n", Shown(line).c_str());
   }
   return code;
 }

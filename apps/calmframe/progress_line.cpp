@@ -8,7 +8,7 @@
 #include <cstdio>
 #include <nlohmann/json.hpp>
 
-#include "host/batch/clip_names.h"
+#include "host/base/shown_text.h"
 
 namespace calmframe {
 namespace {
@@ -178,7 +178,7 @@ void ProgressLine::Tell(const char* key, const std::string& line) {
   if (form_ == Form::json || form_ == Form::json_end) {
     std::fprintf(stderr, "%s\n", JsonLine({{key, line}}).c_str());
   } else {
-    std::fprintf(stderr, "calmframe: %s\n", batch::Shown(line).c_str());
+    std::fprintf(stderr, "calmframe: %s\n", Shown(line).c_str());
   }
 }
 

@@ -11,7 +11,7 @@
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
 #include "apps/calmframe/track_export.h"
-#include "host/batch/clip_names.h"
+#include "host/base/shown_text.h"
 #include "host/media/output_file.h"
 #include "host/project/project_file.h"
 #include "host/stabilize/choice.h"
@@ -129,7 +129,7 @@ void InfoCommand::Run() {
     return;
   }
   std::printf("%s: %d frames of %dx%d from %d, %.6g a second, %zu bytes of results\n",
-              batch::Shown(clip.empty() ? project.clip_path : clip).c_str(), frames, project.width,
+              Shown(clip.empty() ? project.clip_path : clip).c_str(), frames, project.width,
               project.height, start, rate, bytes);
   for (const host::SavedShot& shot : project.shots) {
     const auto choice = host::Choice::Parse(shot.choice);
@@ -137,16 +137,15 @@ void InfoCommand::Run() {
       std::printf("frames %d to %d%s", shot.start_frame, EndOf(shot), choice ? ": " : "\n");
     }
     if (choice) {
-      std::printf("%s\n",
-                  batch::Shown(choice->Text() + ": " + choice->best().outcome.Text()).c_str());
+      std::printf("%s\n", Shown(choice->Text() + ": " + choice->best().outcome.Text()).c_str());
     }
   }
   if (EndOf(project.shots.back()) < project.end_frame) {
     std::printf("stopped there, %d frames before the end\n",
                 project.end_frame - EndOf(project.shots.back()));
   }
-  std::printf("%s\n", trouble.empty() ? "the clip is the one that was analysed"
-                                      : batch::Shown(trouble).c_str());
+  std::printf("%s\n",
+              trouble.empty() ? "the clip is the one that was analysed" : Shown(trouble).c_str());
 }
 
 TracksCommand::TracksCommand(CLI::App& program)

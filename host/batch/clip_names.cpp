@@ -81,31 +81,6 @@ std::string TaskId(const std::string& output) {
   return id + hash;
 }
 
-std::string Shown(const std::string& name) {
-  std::string shown;
-  for (std::size_t at = 0; at < name.size(); ++at) {
-    const char c = name[at];
-    const auto byte = static_cast<unsigned char>(c);
-    const auto next = static_cast<unsigned char>(at + 1 < name.size() ? name[at + 1] : 0);
-    char code[8] = "";
-    if (c == '\n') {
-      shown += "\\n";
-    } else if (c == '\t') {
-      shown += "\\t";
-    } else if (byte < 32 || byte == 127) {
-      std::snprintf(code, sizeof code, "\\x%02x", byte);
-      shown += code;
-    } else if (byte == 0xc2 && next >= 0x80 && next < 0xa0) {  // terminals obey these, too
-      std::snprintf(code, sizeof code, "\\u%04x", next);
-      shown += code;
-      ++at;
-    } else {
-      shown += c;
-    }
-  }
-  return shown;
-}
-
 nlohmann::ordered_json JsonOfBytes(const std::string& bytes) {
   nlohmann::ordered_json text = bytes;
   try {

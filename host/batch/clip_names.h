@@ -18,10 +18,6 @@ std::string TemplateTrouble(const std::string& name_template);
 // A name for a folder, unique for an output's: letters, digits and few signs, at most 81 bytes.
 std::string TaskId(const std::string& output);
 
-// A name, or what is said of it, in one line: what would break or blur it, or move a terminal's
-// cursor, stands as \n, \t, \x1b or \u009b.
-std::string Shown(const std::string& name);
-
 // A file's name may be any bytes, JSON's text may not: what is no UTF-8 is an array of numbers.
 nlohmann::ordered_json JsonOfBytes(const std::string& bytes);
 // Throws nlohmann::json::exception.

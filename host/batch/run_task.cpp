@@ -16,6 +16,7 @@
 #include <utility>
 
 #include "host/base/json_depth.h"
+#include "host/base/shown_text.h"
 #include "host/batch/child.h"
 #include "host/media/clip.h"
 #include "host/media/output_file.h"

@@ -13,6 +13,7 @@
 #include <thread>
 #include <utility>
 
+#include "host/base/shown_text.h"
 #include "host/batch/child.h"
 
 namespace calmframe::batch {

@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <nlohmann/json.hpp>
 
+#include "host/base/shown_text.h"
 #include "host/batch/clip_names.h"
 #include "host/batch/local_batch.h"
 #include "host/batch/machine.h"
