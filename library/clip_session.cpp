@@ -290,7 +290,7 @@ class ClipSession::ShotHold {
 void ClipSession::Path(std::int64_t first, std::int64_t count, calmframe_place* places) {
   ExpectNotFetching();
   if (count < 0 || first < 0) Refuse(CALMFRAME_ERROR_ARGUMENT, "frames below 0");
-  if (count > kMostFrames || first > kMostFrames) {
+  if (count > media::kMaximumFrames || first > media::kMaximumFrames) {
     Refuse(CALMFRAME_ERROR_ARGUMENT, "more frames than a clip can have");
   }
   for (const std::int64_t end = first + count; first < end;) {

@@ -18,8 +18,9 @@ media::ClipInfo ClipOf(const calmframe_options& options) {
   Expect(options.aspect_num > 0 && options.aspect_den > 0, "the pixel aspect is not above 0");
   Expect(options.rate_num > 0 && options.rate_den > 0, "the frame rate is not above 0");
   Expect(options.field_order >= 0 && options.field_order <= 2, "there is no such field order");
-  Expect(options.frame_count > 0 && options.frame_count <= kMostFrames,
-         "frame_count is " + std::to_string(options.frame_count) + ", and 1 to 10000000 go");
+  Expect(options.frame_count > 0 && options.frame_count <= media::kMaximumFrames,
+         "frame_count is " + std::to_string(options.frame_count) + ", and 1 to " +
+             std::to_string(media::kMaximumFrames) + " go");
   Expect(options.full_range == 0 || options.full_range == 1, "full_range is neither 0 nor 1");
   Expect(options.matrix >= 0 && options.matrix < AVCOL_SPC_NB,
          "matrix " + std::to_string(options.matrix) + ": there is none such");
@@ -64,7 +65,8 @@ host::ShotRequest ShotsOf(const calmframe_options& options) {
       return {.kind = Kind::automatic};
     case CALMFRAME_SHOTS_LIST: {
       Expect(options.shot_starts || options.shot_start_count == 0, "shot_starts is null");
-      Expect(options.shot_start_count <= std::size_t{kMostFrames}, "too many shot_starts");
+      Expect(options.shot_start_count <= std::size_t{media::kMaximumFrames},
+             "too many shot_starts");
       std::vector<std::int64_t> starts(options.shot_starts,
                                        options.shot_starts + options.shot_start_count);
       for (std::size_t i = 0; i < starts.size(); ++i) {

@@ -10,9 +10,6 @@
 
 namespace calmframe::library {
 
-// As for clips of files: what a table of tracks is made for.
-constexpr std::int64_t kMostFrames = 10'000'000;
-
 // What a session is asked for, without what the options point at.
 struct SessionRequest {
   // Throws Refusal, media::Failure for a clip that can't be read.

@@ -9,6 +9,7 @@
 #include <set>
 #include <utility>
 
+#include "host/media/clip.h"
 #include "host/project/project_join.h"
 
 namespace calmframe::batch {
@@ -16,9 +17,8 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr std::size_t kLeastFrames = 250;        // whose drawing outweighs a program's start
-constexpr std::size_t kMostFrames = 10'000'000;  // of a clip, as host/media takes them
-constexpr std::size_t kMostPieces = 400;         // of a film; each is a file until it is joined
+constexpr std::size_t kLeastFrames = 250;  // whose drawing outweighs a program's start
+constexpr std::size_t kMostPieces = 400;   // of a film; each is a file until it is joined
 
 // In frames of the film, the end left out.
 struct Stretch {
@@ -83,7 +83,8 @@ class SplitFilm {
     for (const auto& shot : json->at("shots")) {
       const Stretch told{static_cast<std::size_t>(WholeOf(shot.at("first_frame"))),
                          static_cast<std::size_t>(WholeOf(shot.at("end_frame")))};
-      is_a_film = is_a_film && told.first < told.end && told.end <= kMostFrames &&
+      is_a_film = is_a_film && told.first < told.end &&
+                  told.end <= std::size_t{media::kMaximumFrames} &&
                   (shots_.empty() || told.first == shots_.back().end);
       shots_.push_back(told);
     }

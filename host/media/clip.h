@@ -16,6 +16,9 @@
 // pixel aspect is not.
 namespace calmframe::media {
 
+// That a clip can have: four days at 29 a second; an index of so many takes some 400 MB.
+constexpr std::int64_t kMaximumFrames = 10'000'000;
+
 // What went wrong with a file, in one line that names it. `input`: reading; `output`: writing.
 class Failure : public std::runtime_error {
  public:

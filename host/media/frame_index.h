@@ -12,9 +12,6 @@
 
 namespace calmframe::media {
 
-// Four days at 29 a second; an index of so many takes some 400 MB.
-constexpr std::size_t kMaximumFrames = 10'000'000;
-
 // Hash of a frame's pixels, padding left out. Tells whether decoding from a seek point gave the
 // frame that decoding from the start gives.
 std::uint64_t Fingerprint(const AVFrame& frame);

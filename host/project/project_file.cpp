@@ -26,7 +26,7 @@ bool IsWithinRanges(const Project& project) {
       std::int64_t{project.width} * project.height > media::kMaximumPixels) {
     return false;
   }
-  constexpr auto kFrames = static_cast<std::int64_t>(media::kMaximumFrames);
+  constexpr std::int64_t kFrames = media::kMaximumFrames;
   std::int64_t last_end = std::numeric_limits<std::int64_t>::min();
   for (const SavedShot& shot : project.shots) {
     const std::int64_t start = shot.start_frame, length = shot.length;

@@ -14,8 +14,6 @@
 
 namespace calmframe::studio {
 
-constexpr std::int64_t kMostFrames = 10'000'000;  // of a clip, as host/media takes them
-
 // What every clip's worker is started with, and who hears of clips.
 struct ClipSurroundings {
   boost::asio::io_context& context;

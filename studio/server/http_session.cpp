@@ -207,7 +207,8 @@ class Session : public std::enable_shared_from_this<Session> {
     const std::string side = FieldOf(query_, "side");
     Ask(clip,
         {{"op", "frame"},
-         {"frame", std::clamp<std::int64_t>(NumberIn(query_, "frame", 0), 0, kMostFrames)},
+         {"frame",
+          std::clamp<std::int64_t>(NumberIn(query_, "frame", 0), 0, media::kMaximumFrames)},
          {"width", std::clamp<std::int64_t>(NumberIn(query_, "width", 640), 16, 8192)},
          {"tracks", side == "tracks"},
          {"before", side != "after" && side != "tracks"},

@@ -273,7 +273,7 @@ nlohmann::json Studio::ActOnClip(const std::string& op, Clip& clip, const nlohma
   } else if (op == "cancel") {
     clip.Tell({{"op", "cancel"}});
   } else if (op == "look") {
-    clip.Tell({{"op", "look"}, {"frame", WholeIn(request, "frame", kMostFrames)}});
+    clip.Tell({{"op", "look"}, {"frame", WholeIn(request, "frame", media::kMaximumFrames)}});
   } else if (op == "save") {
     const std::string path = roots_.ToWrite(request.at("path").get<std::string>());
     if (!IsProject(path)) throw std::invalid_argument("saved work is named like walk.calm");
@@ -336,7 +336,7 @@ nlohmann::json Studio::Render(Clip& clip, const nlohmann::json& request, const A
 // What a lasso holds; with "deletes" they are deleted, else shown.
 void Studio::AskForTracks(Clip& clip, const nlohmann::json& request, const Answer& later) {
   nlohmann::json head = {{"op", "lasso"},
-                         {"frame", WholeIn(request, "frame", kMostFrames)},
+                         {"frame", WholeIn(request, "frame", media::kMaximumFrames)},
                          {"any_frame", request.value("any_frame", false)},
                          {"corners", request.value("corners", Corners())}};
   if (head["corners"].size() > kMostCorners) throw std::invalid_argument("too many corners");
