@@ -93,14 +93,19 @@ typedef struct HX_StringSuite1 {
 
 #define HX_ANALYSIS_HOST_SUITE "Analysis Host Suite"
 #define HX_ANALYSIS_HOST_SUITE_VERSION 1
+/* What saved results are wanted for, and how they came. A plug-in may deflate them all the same. */
+enum {
+  HX_PAYLOAD_DEFLATED = 0, /* for a project */
+  HX_PAYLOAD_RAW = 1,
+  HX_PAYLOAD_PACKED = 2 /* for this process alone, in little memory */
+};
 typedef struct HX_AnalysisHostSuite1 {
   HX_Err (*CancelJob)(HX_EffectRef effect);                       /* op 1 */
   HX_Err (*ReportJobEnd)(HX_EffectRef effect, uint8_t success);   /* op 2 */
   HX_Err (*IsScheduled)(HX_EffectRef effect, uint8_t* scheduled); /* op 3 */
   HX_Err (*MayStart)(HX_EffectRef effect, uint8_t* may);          /* op 4; UI */
-  /* op 5; UI; 1: not compressed; 2: packed, for this process alone */
-  HX_Err (*GetCompressionPreference)(uint8_t* raw);
-  HX_Err (*ScheduleAnalysis)(HX_EffectRef effect); /* op 6; UI */
+  HX_Err (*GetCompressionPreference)(uint8_t* raw);               /* op 5; UI; HX_PAYLOAD_* */
+  HX_Err (*ScheduleAnalysis)(HX_EffectRef effect);                /* op 6; UI */
   /* op 7. Why the layer can't be analysed; empty when it can. */
   HX_Err (*GetRefusal)(HX_EffectRef effect, uint16_t* text, uint32_t max);
 } HX_AnalysisHostSuite1;

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 
+#include "platform/hx/hx_suites.h"
 #include "platform/tessel/filesupport.h"
 
 // The frame of the format: its versions, and the marks between its sections.
@@ -38,15 +39,15 @@ enum : std::uint32_t {
 };
 
 // How a payload stands in its handle, as the handle's raw flag tells it. Packed ones stay in the
-// memory of the process that makes them: a host asks for them by a preference of 2.
+// memory of the process that makes them: a host asks for them by their preference.
 enum class PayloadForm : std::uint8_t {
-  deflated = 0,
-  raw = 1,    // and whatever is none of the others
-  packed = 2  // raw, but for warps and tracks; of the present version alone
+  deflated = HX_PAYLOAD_DEFLATED,
+  raw = HX_PAYLOAD_RAW,       // and whatever is none of the others
+  packed = HX_PAYLOAD_PACKED  // raw, but for warps and tracks; of the present version alone
 };
 inline PayloadForm FormOf(std::uint32_t version, std::uint8_t raw) {
-  if (raw == 0 || version < kRawPayloads) return PayloadForm::deflated;
-  const bool is_packed = raw == static_cast<std::uint8_t>(PayloadForm::packed);
+  if (raw == HX_PAYLOAD_DEFLATED || version < kRawPayloads) return PayloadForm::deflated;
+  const bool is_packed = raw == HX_PAYLOAD_PACKED;
   return is_packed && version == kPresentVersion ? PayloadForm::packed : PayloadForm::raw;
 }
 
