@@ -26,9 +26,6 @@ constexpr int kEqualRounds = 3, kUnequalRounds = 5;
 // How sure a track's group must be, from -1, the subject, to 1, the background.
 constexpr double kSure = 0.5;
 
-// Statuses of deleted tracks: docs/state_format.md.
-constexpr std::int32_t kDeletedBegins = -10, kDeletedGoesOn = -11;
-
 double MissOf(const Point& off) {
   return (off.x * off.x + off.y * off.y) / (kTrackTolerance * kTrackTolerance);
 }
@@ -106,7 +103,7 @@ class Tracks {
     float x, y, before_x, before_y;
   };
 
-  static bool Begins(std::int32_t status) { return status > 0 || status == kDeletedBegins; }
+  static bool Begins(std::int32_t status) { return status > 0 || status == kDeletedTrackBegins; }
 
   // visit(row, its tracks, which track is in each slot)
   template <class Visit>
@@ -119,7 +116,7 @@ class Tracks {
         const std::int32_t status = tracks.statuses[slot];
         if (Begins(status)) {
           of_slot[slot] = begun++;
-        } else if (status != 0 && status != kDeletedGoesOn) {
+        } else if (status != 0 && status != kDeletedTrackGoesOn) {
           of_slot[slot] = kNone;
         }
       }

@@ -8,16 +8,15 @@
 namespace calmframe::host {
 
 const Seams::Row& Seams::RowOf(std::int32_t frame) {
-  constexpr std::int32_t kBeginsDeleted = -10, kGoesOnDeleted = -11;
   while (first_ + static_cast<std::int32_t>(rows_.size()) <= frame) {
     const std::int32_t next = first_ + static_cast<std::int32_t>(rows_.size());
     TrackRow tracks = plane_.clip().TracksOf(static_cast<std::size_t>(next));
     Row row{std::move(tracks.places), std::vector<std::int32_t>(tracks.statuses.size(), -1)};
     for (std::size_t s = 0; s < row.begins.size(); ++s) {
       const std::int32_t status = tracks.statuses[s];
-      if (status > 0 || status == kBeginsDeleted) {
+      if (status > 0 || status == kDeletedTrackBegins) {
         row.begins[s] = next;
-      } else if ((status == 0 || status == kGoesOnDeleted) && !rows_.empty()) {
+      } else if ((status == 0 || status == kDeletedTrackGoesOn) && !rows_.empty()) {
         row.begins[s] = rows_.back().begins[s];
       }
     }

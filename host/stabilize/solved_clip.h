@@ -20,8 +20,9 @@ namespace calmframe::host {
 
 // A frame's row of the track table, by slot: where the track is, in the source's own pixels,
 // centres at whole numbers; and what it is: n > 0 a track that begins here, in row n - 1; 0 one
-// that goes on; -10 and -11 the two of one that is deleted, which nothing was solved with; else
-// below 0 none here, and the place means nothing.
+// that goes on; the two of one that is deleted, which nothing was solved with; else below 0 none
+// here, and the place means nothing.
+inline constexpr std::int32_t kDeletedTrackBegins = -10, kDeletedTrackGoesOn = -11;
 struct TrackRow {
   std::vector<Point> places;
   std::vector<std::int32_t> statuses;

@@ -31,8 +31,6 @@ constexpr std::int32_t kDrawnAlone[] = {
 // wide count less. Of eight filmed clips' first 6 to 14 frames 2 to 3 kept the most of the width.
 constexpr double kTransitionBisquareSigma = 3;
 
-constexpr std::int32_t kDeletedTrackBegins = -10;  // see SolvedClip::statuses
-
 // The effect's words for what its status counter tells when it has ended without a result.
 enum Status { kReady = 8, kAnalysisFailed = 9, kSolveFailed = 10 };
 

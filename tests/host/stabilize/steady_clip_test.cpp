@@ -261,7 +261,7 @@ TEST_F(SteadyClipTest, TracksThatAPersonDeletesStayApartFromAGroupThatIsLeftOut)
     for (std::int32_t row = 0; row < solved.frame_count; ++row) {
       const TrackRow tracks = solved.TracksOf(static_cast<std::size_t>(row));
       for (std::int32_t slot = 0; slot < solved.slots; ++slot) {
-        if (tracks.statuses[static_cast<std::size_t>(slot)] == -10) {
+        if (tracks.statuses[static_cast<std::size_t>(slot)] == kDeletedTrackBegins) {
           points.insert({solved.first_frame + row, slot});
         }
       }
