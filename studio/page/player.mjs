@@ -241,7 +241,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
       if (how.speed) {
         [list, onView] = playing(now, of, how, address, width);
       } else {
-        const other_ = (wide) => `${beside}&width=${wide}&frame=${how.frame}`;
+        const besideAt = (wide) => `${beside}&width=${wide}&frame=${how.frame}`;
         const held = engine.pictures.held;
         if (asked !== onView) {
           restAt = asked ? now + REST : now;
@@ -253,8 +253,8 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
         if (hurries) timer = setTimeout(engine.work, restAt - now);
         const pick = (at) => (held.has(at(width)) || (!hurries && !held.has(at(rough))) ? at(width) : at(rough));
         onView = pick((wide) => address(how.frame, wide));
-        if (apart) other = pick(other_);
-        const best = hurries ? [onView, other] : [address(how.frame, width), apart ? other_(width) : ''];
+        if (apart) other = pick(besideAt);
+        const best = hurries ? [onView, other] : [address(how.frame, width), apart ? besideAt(width) : ''];
         list = best.filter(Boolean);
       }
       engine.pictures.want(list, how.speed !== 0);
