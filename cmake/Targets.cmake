@@ -21,9 +21,8 @@ function(calmframe_library name)
     file(STRINGS "${source}" includes_itself REGEX "define HWY_TARGET_INCLUDE" LIMIT_COUNT 1)
     if(includes_itself)
       set_source_files_properties("${source}" PROPERTIES SKIP_UNITY_BUILD_INCLUSION ON)
-      # What a file can do to a loop, or a thread to its data, it can do to that of the plainest machine; the other tests
-      # take them all.
-      if(CALMFRAME_FUZZ OR CALMFRAME_SANITIZE STREQUAL "thread")
+      # What a file can do to a loop, it can do to that of the plainest machine; the tests take them all.
+      if(CALMFRAME_FUZZ)
         set_source_files_properties("${source}" PROPERTIES COMPILE_DEFINITIONS HWY_COMPILE_ONLY_STATIC)
       endif()
     endif()
