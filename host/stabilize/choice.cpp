@@ -24,9 +24,9 @@ double Decibels(double value) {
   return 20 * std::log10(value);
 }
 
-// Less is better: first whether black is left, then the cost.
-std::pair<bool, double> RankOf(const Candidate& candidate, const ChoiceWeights& weights) {
-  return {candidate.outcome.most_black > weights.black, candidate.cost};
+// Less is better.
+std::pair<bool, double> RankOf(const Candidate& candidate) {
+  return {!candidate.holds, candidate.cost};
 }
 
 template <class... Values>
@@ -53,7 +53,14 @@ ParamValues ToValues(const nlohmann::json& object) {
 }  // namespace
 
 std::string Choice::Text() const {
-  if (!best().follows) return "passed through as it was filmed: nothing calmer was found";
+  if (!best().follows) {
+    const bool holds =
+        std::any_of(candidates.begin(), candidates.end(),
+                    [](const Candidate& other) { return other.follows && other.holds; });
+    return holds ? "passed through as it was filmed: nothing calmer was found"
+                 : "passed through as it was filmed: nothing calmer stays below the zoom's limit "
+                   "with nothing black";
+  }
   std::string text = best().name;
   if (still != Still::all) text += ", "s + kStills[static_cast<std::size_t>(still)] + " held still";
   if (candidates.size() > 1) text += ", best of " + std::to_string(candidates.size());
@@ -61,17 +68,18 @@ std::string Choice::Text() const {
 }
 
 std::string Choice::Why() const {
-  const ChoiceWeights weights;
   const Candidate* next = nullptr;
   for (const Candidate& candidate : candidates) {
     if (&candidate == &best() || !candidate.follows) continue;
-    if (!next || RankOf(candidate, weights) < RankOf(*next, weights)) next = &candidate;
+    if (!next || RankOf(candidate) < RankOf(*next)) next = &candidate;
   }
   if (!next || !best().follows) return "";
   const Outcome &a = next->outcome, &b = best().outcome;
   std::string text = "next comes " + next->name;
-  if (RankOf(*next, weights).first && !RankOf(best(), weights).first) {
-    return text + Printed(", which leaves %.1f %% of a frame black", 100 * a.most_black);
+  if (best().holds && !next->holds) {
+    return text + (a.most_black > ChoiceWeights().black
+                       ? Printed(", which leaves %.1f %% of a frame black", 100 * a.most_black)
+                       : Printed(", which enlarges %.2f times", a.most_zoom));
   }
   text += Printed(", %.1f decibels behind", next->cost - best().cost);
   struct Figure {
@@ -115,6 +123,8 @@ nlohmann::ordered_json Choice::Json() const {
     nlohmann::ordered_json row;
     row["name"] = candidates[i].name;
     row["changes"] = ToJson(candidates[i].changes);
+    row["fills"] = candidates[i].fills;
+    row["holds"] = candidates[i].holds;
     row["taken"] = i == taken;
     row["width_weight"] = candidates[i].width_weight;
     row["cost"] = std::round(candidates[i].cost * 100) / 100;
@@ -143,6 +153,9 @@ std::optional<Choice> Choice::Parse(const std::string& text) {
       candidate.outcome = Outcome::Parse(row);
       candidate.warps = candidate.outcome.bends ? Warps::solved : Warps::none;
       candidate.follows = candidate.outcome.window == Outcome::Window::follow;
+      // Choices that were saved before the limit counted lack these.
+      candidate.fills = row.value("fills", true);
+      candidate.holds = row.value("holds", candidate.outcome.most_black <= ChoiceWeights().black);
       if (row.at("taken").get<bool>()) choice.taken = choice.candidates.size();
       choice.candidates.push_back(std::move(candidate));
     }
@@ -210,7 +223,7 @@ bool Chooser::Consider(Candidate candidate, const MovingClip& solved, bool by_be
     tries.push_back(candidate);
   }
   std::vector<std::vector<Similarity>> windows(tries.size());
-  const WindowFinder finder(plane, motion, settings_);
+  const WindowFinder finder(plane, motion, SettingsFor(candidate));
   tessel::threads::ExecuteCPUBoundTaskOnAllProcessors(
       [&](std::size_t i) { windows[i] = finder.Find(tries[i].width_weight); }, tries.size());
   const std::vector<ShownMotion> shown = MotionsShown(plane, motion, windows, finder.filled());
@@ -220,16 +233,17 @@ bool Chooser::Consider(Candidate candidate, const MovingClip& solved, bool by_be
         at.outcome = MeasureOutcome(source_, shown[i], settings_.frames_per_second);
         at.outcome.window = Outcome::Window::follow;
         at.outcome.bends = at.warps == Warps::solved;
+        at.holds = Holds(at.outcome);
         at.cost = CostOf(at);
       },
       tries.size());
   std::size_t best = 0;
   for (std::size_t i = 1; i < tries.size(); ++i) {
-    if (RankOf(tries[i], weights_) < RankOf(tries[best], weights_)) best = i;
+    if (RankOf(tries[i]) < RankOf(tries[best])) best = i;
   }
   choice_.candidates.push_back(std::move(tries[best]));
   if (choice_.candidates.size() > 1 &&
-      RankOf(choice_.candidates.back(), weights_) >= RankOf(choice_.best(), weights_)) {
+      RankOf(choice_.candidates.back()) >= RankOf(choice_.best())) {
     return false;
   }
   choice_.taken = choice_.candidates.size() - 1;
@@ -243,9 +257,8 @@ void Chooser::ConsiderAsFilmed() {
   filmed.outcome.window = Outcome::Window::none;
   filmed.outcome.bends = false;
   filmed.cost = CostOf(filmed);
-  const Outcome& best = choice_.best().outcome;
-  const bool is_best =
-      best.most_black > weights_.black || UnrestOf(best) >= UnrestOf(filmed.outcome);
+  const Candidate& best = choice_.best();
+  const bool is_best = !best.holds || UnrestOf(best.outcome) >= UnrestOf(filmed.outcome);
   choice_.candidates.push_back(std::move(filmed));
   if (!is_best) return;
   choice_.taken = choice_.candidates.size() - 1;
@@ -256,16 +269,27 @@ void Chooser::Take(const Choice& choice, const MovingClip& solved) {
   choice_ = choice;
   const WarpedPlane plane(solved.clip(), choice_.best().warps);
   const Candidate& best = choice_.best();
-  windows_ =
-      best.follows
-          ? WindowFinder(plane, *solved.motion(best.warps), settings_).Find(best.width_weight)
-          : whole_frames_;
+  windows_ = best.follows ? WindowFinder(plane, *solved.motion(best.warps), SettingsFor(best))
+                                .Find(best.width_weight)
+                          : whole_frames_;
 }
 
 bool Chooser::leaves_shake() const {
   const Outcome& outcome = choice_.best().outcome;
   const double seen = std::hypot(std::max(outcome.after.mean, outcome.tracks_after), weights_.seen);
   return Decibels(seen / weights_.seen) > weights_.change;
+}
+
+bool Chooser::Holds(const Outcome& outcome) const {
+  // Whoever makes the picture smaller has a rim.
+  return (outcome.most_black <= weights_.black || settings_.enlarged < 1) &&
+         outcome.most_zoom <= settings_.most_zoom * settings_.enlarged * (1 + weights_.over);
+}
+
+FollowSettings Chooser::SettingsFor(const Candidate& candidate) const {
+  FollowSettings settings = settings_;
+  if (!candidate.fills) settings.filling.reset();
+  return settings;
 }
 
 double Chooser::UnrestOf(const Outcome& outcome) const {

@@ -19,9 +19,12 @@ struct Candidate {
   std::string name;          // as users are told of it
   ParamValues changes = {};  // of the effect's parameters, against the controls as they were given
   Warps warps = Warps::solved;
-  bool follows = true;                          // by windows; else the source as it was filmed
+  bool follows = true;  // by windows; else the source as it was filmed
+  bool fills = true;    // the edges, where the framing does; else the windows stay in their frames
   double width_weight = WindowWeights().width;  // of the windows; set by the chooser
   Outcome outcome = {};
+  // What windows that follow promise: nothing black, and no frame enlarged beyond the limit.
+  bool holds = true;
   double cost = 0;  // decibels; see ChoiceWeights
 };
 
@@ -38,8 +41,9 @@ struct ChoiceWeights {
   // By how much frames that are shown as shot must be better than bent ones: bends follow depth and
   // the shutter, which the measures see only in part.
   double bends = 0.5;
-  double change = 0.5;   // by how much other controls must be better than those given
-  double black = 0.001;  // share of a frame; more of it is never chosen where there is a way around
+  double change = 0.5;  // by how much other controls must be better than those given
+  // Share of a frame, and of the zoom's limit: more is never chosen where there is a way around.
+  double black = 0.001, over = 0.001;
 };
 
 // Whose motion is smoothed away: everybody's, or that of the background or a near subject alone, by
@@ -63,7 +67,8 @@ struct Choice {
   // of the clip as it was filmed.
   std::string Why() const;
   // As projects keep it and programs read it: "still", "most_zoom", "zoom_speed", "given", and
-  // "candidates" with "name", "changes", "taken", "cost" and the names of Outcome::Json.
+  // "candidates" with "name", "changes", "fills", "holds", "taken", "cost" and the names of
+  // Outcome::Json.
   nlohmann::ordered_json Json() const;
   // None of what is no choice.
   static std::optional<Choice> Parse(const std::string& text);
@@ -94,7 +99,7 @@ class Chooser {
   // the best so far.
   bool Consider(Candidate candidate, const MovingClip& solved, bool by_best_width = false);
   // After all others: the clip as it was filmed, which is taken where none of them is calmer, or
-  // all leave black. What it has ahead of them, its width, counts for nothing.
+  // none holds. What it has ahead of them, its width, counts for nothing.
   void ConsiderAsFilmed();
   // The windows of a candidate that was chosen before, with its solve.
   void Take(const Choice& choice, const MovingClip& solved);
@@ -106,6 +111,8 @@ class Chooser {
   bool leaves_shake() const;
 
  private:
+  bool Holds(const Outcome& outcome) const;
+  FollowSettings SettingsFor(const Candidate& candidate) const;
   // Shake and flicker, in decibels.
   double UnrestOf(const Outcome& outcome) const;
   double CostOf(const Candidate& candidate) const;

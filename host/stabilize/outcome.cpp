@@ -152,7 +152,9 @@ Outcome MeasureOutcome(const Outcome& source, const ShownMotion& shown, double f
   outcome.straying = MeasureStraying(shown, frames_per_second);
   outcome.width_kept = 0;
   for (std::size_t f = 0; f < shown.zooms.size(); ++f) {
-    outcome.width_kept += 1 / shown.zooms[f] / static_cast<double>(shown.zooms.size());
+    // Of a folded frame nothing is shown.
+    const double kept = shown.zooms[f] > 0 ? 1 / shown.zooms[f] : 0;
+    outcome.width_kept += kept / static_cast<double>(shown.zooms.size());
     outcome.most_zoom = std::max(outcome.most_zoom, shown.zooms[f]);
     outcome.most_black = std::max(outcome.most_black, shown.uncovered[f]);
   }

@@ -233,16 +233,28 @@ void SteadyClip::FollowPicture(const FollowRequest& request, Watcher& watcher) {
   Chooser chooser(*solved, settings);
   Progress progress{.stage = "choosing", .total = 1};
   watcher.Show(progress);
+  const auto holds = [&chooser] { return chooser.choice().best().holds; };
   chooser.Consider({.name = "as set"}, *solved);
-  // Whoever asks for a method has its warps; deblurring goes by theirs, too.
-  if (request.may_choose && IsFree(HX_METHOD.disk_id) && ValueOf(kDeblur) == 0) {
-    chooser.Consider({.name = "not bent", .warps = Warps::none}, *solved, true);
+  // Deblurring goes by the warps; whoever asks for a method has its own, as far as they can be
+  // shown.
+  const bool may_unbend = ValueOf(kDeblur) == 0;
+  if (may_unbend && ((request.may_choose && IsFree(HX_METHOD.disk_id)) || !holds())) {
+    chooser.Consider({.name = "not bent", .warps = Warps::none}, *solved, holds());
+  }
+  if (!holds() && settings.filling) {
+    chooser.Consider({.name = "edges not filled", .fills = false}, *solved);
+    if (may_unbend) {
+      chooser.Consider({.name = "not bent, edges not filled", .warps = Warps::none, .fills = false},
+                       *solved);
+    }
   }
   Effect* copy = nullptr;
   solved.reset();  // and what is known of its motion, unless that is kept
   worked_.GiveBack();
-  if (request.may_choose && chooser.leaves_shake()) copy = TryControls(saved, chooser, watcher);
-  if (request.may_choose && settings.enlarged == 1) chooser.ConsiderAsFilmed();
+  if (request.may_choose && (chooser.leaves_shake() || !holds())) {
+    copy = TryControls(saved, chooser, watcher);
+  }
+  if ((request.may_choose || !holds()) && settings.enlarged == 1) chooser.ConsiderAsFilmed();
   if (copy && chooser.choice().best().changes.empty()) {  // then the controls stay, too
     worked_.session().Remove(*copy);
   } else if (copy) {
@@ -324,11 +336,12 @@ void SteadyClip::ShowAsFilmed(Watcher& watcher) {
 
 void SteadyClip::Draw(const Candidate& shown, const std::vector<Similarity>& windows,
                       SavedEffect saved, Watcher& watcher) {
-  const bool fills = shown.follows && ValueOf(HX_FRAMING.disk_id) == kSynthesizeEdges;
-  saved.instance =
-      WithWindows(saved.instance, windows, shown.warps, fills ? PlacedBy::bounds : PlacedBy::crop);
-  // Of a clip as it was filmed nothing is feathered and filled.
-  if (!fills && !Crops(ValueOf(HX_FRAMING.disk_id))) {
+  const double framing = ValueOf(HX_FRAMING.disk_id);
+  const bool fills_edges = shown.follows && framing == kSynthesizeEdges;
+  saved.instance = WithWindows(saved.instance, windows, shown.warps,
+                               fills_edges ? PlacedBy::bounds : PlacedBy::crop);
+  // Of what stays in its frames nothing is feathered and filled.
+  if (!(fills_edges && shown.fills) && !Crops(framing)) {
     saved.values[HX_FRAMING.disk_id] = kStabilizeOnly;
   }
   saved.values[HX_ADDITIONAL_SCALE.disk_id] = 100;

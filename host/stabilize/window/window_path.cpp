@@ -80,7 +80,7 @@ class WindowProgramme {
       add(f, {0, 0, 0, -1}, kMostTurn * kEdge);
       double least = 0;
       if (largest) {
-        constexpr double kRoom = 0.995;
+        constexpr double kRoom = 0.9995;
         least = std::min(kEdge / frames_[f].most_zoom, kRoom * (*largest)[IndexOf(f, kScale)]);
       }
       add(f, {0, 0, -1, 0}, -least);

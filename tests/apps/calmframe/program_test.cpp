@@ -159,7 +159,10 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
                          Run{"--smoothness 80 --window follow", "asked for", 1.5},
                          Run{"--smoothness 20", "where the effect's own leaves black", 1.5},
                          Run{"--smoothness 80 --zoom-speed 0", "zoomed once for all", 1.5},
-                         Run{"--framing synthesize-edges --zoom-at-most 1.2", "filled", 1.2}}) {
+                         Run{"--as-set --zoom-at-most 1.05", "limited, as set", 1.05},
+                         Run{"--framing synthesize-edges --zoom-at-most 1.2", "filled", 1.2},
+                         Run{"--framing synthesize-edges --zoom-at-most 1.05",
+                             "no room for a feather", 1.05}}) {
     const std::string told =
         RunWell("stabilize in.mkv out.mkv --codec ffv1 --overwrite " + run.flags);
     const std::size_t at = told.find("zoom ");

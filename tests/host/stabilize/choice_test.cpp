@@ -18,7 +18,8 @@ namespace {
 // Points of a flat scene that a shaking hand films, and warps that undo its motion but for `noise`
 // pixels by which each vertex of each frame is off. Every fourth vertex of the noise has it alone,
 // so that no similarity undoes it. `growth`: by which the camera comes nearer from frame to frame.
-SolvedClip Filmed(double noise, double growth = 1) {
+// `roll`: radians by which it turns at most.
+SolvedClip Filmed(double noise, double growth = 1, double roll = 0) {
   constexpr int kFrames = 90, kSlots = 80;
   std::mt19937 random(6);
   std::uniform_real_distribution<double> even(-1, 1);
@@ -36,8 +37,12 @@ SolvedClip Filmed(double noise, double growth = 1) {
   }
   for (int f = 0; f < kFrames; ++f) {
     const double near = std::pow(growth, f - kFrames / 2);
-    const Similarity hand{near, 0.01 * even(random), 6 * even(random) + 200 * (1 - near),
-                          6 * even(random) + 150 * (1 - near)};
+    Similarity hand{near, 0.01 * even(random), 6 * even(random) + 200 * (1 - near),
+                    6 * even(random) + 150 * (1 - near)};
+    if (roll > 0) {
+      const double turn = roll * even(random), c = std::cos(turn), s = std::sin(turn);
+      hand = Compose({c, s, 200 - 200 * c + 150 * s, 150 - 200 * s - 150 * c}, hand);
+    }
     for (const Point& point : scene) {
       given.tracks.push_back(hand(point));
       given.statuses.push_back(f == 0 ? 1 : 0);
@@ -97,6 +102,34 @@ TEST(ChooserTest, WhatIsNoBetterThanTheSourceIsLeftAsItIs) {
   EXPECT_EQ(choice.best().outcome.window, Outcome::Window::none);
 }
 
+// A hand that turns the camera by 23 degrees to either side, of which a window goes along with 9:
+// what warps undo of it shows some frames 1.4 times enlarged, 1.3 times at least. A window that
+// keeps `rim` pixels off the edges of a frame that is not bent shows it 300 / (300 - 2 rim) times
+// enlarged, where no neighbour fills more.
+TEST(ChooserTest, TheZoomsLimitCountsBeforeAllThatIsCalmer) {
+  const SolvedClip clip = Filmed(0, 1, 0.4);
+  const Candidate unfilled{.name = "unfilled", .warps = Warps::none, .fills = false};
+  struct Case {
+    double limit, rim;  // 0: nothing is filled
+    std::vector<Candidate> candidates;
+    const char* taken;
+  };
+  for (const Case& c :
+       {Case{1.5, 0, {kUnbent, kBent}, "bent"}, Case{1.2, 0, {kBent, kUnbent}, "unbent"},
+        Case{1.2, 0, {kUnbent, kBent}, "unbent"}, Case{1.2, 0, {kBent}, "as filmed"},
+        Case{1.2, 10, {kBent, kUnbent}, "unbent"},
+        Case{1.05, 10, {kBent, kUnbent, unfilled}, "unfilled"},
+        Case{1, 10, {kBent, kUnbent, unfilled}, "as filmed"}}) {
+    FollowSettings settings;
+    settings.most_zoom = c.limit;
+    if (c.rim > 0) settings.filling = Filling{0, c.rim};
+    const Choice choice = Best(clip, c.candidates, settings);
+    EXPECT_EQ(choice.best().name, c.taken) << c.limit << ", " << c.rim;
+    EXPECT_LE(choice.best().outcome.most_zoom, c.limit * 1.001) << c.taken;
+    EXPECT_LT(choice.best().outcome.most_black, 0.001) << c.taken;
+  }
+}
+
 // The same windows, enlarged or made smaller afterwards.
 TEST(ChooserTest, AnEnlargementComesOnTop) {
   const SolvedClip clip = Filmed(0);
@@ -138,14 +171,17 @@ TEST(ChoiceTest, TellsWhatTheNextBestIsWorseAt) {
     candidate.outcome.wobble_before = 0.3;
     candidate.outcome.wobble_after = wobble;
     candidate.outcome.most_black = black;
+    candidate.holds = black == 0;
     return candidate;
   };
   const Candidate good = way("good", 2, 0.85, 1.2, 1, 0.2), far = way("far", 9, 0.5, 4, 4, 0.3),
                   mixed = way("mixed", 3.2, 0.79, 1.5, 0.7, 0.6),
                   same = way("same", 2.5, 0.8501, 1.201, 1, 0.25),
                   black = way("black", 1, 0.9, 1, 1, 0.2, 0.02);
-  Candidate filmed = way("as filmed", 1, 1, 9, 9, 0.3);
+  Candidate filmed = way("as filmed", 1, 1, 9, 9, 0.3), near = way("near", 1, 0.6, 1, 1, 0.2);
   filmed.follows = false;  // it is not weighed by its cost
+  near.outcome.most_zoom = 1.625;
+  near.holds = false;
   struct Case {
     std::vector<Candidate> candidates;
     std::size_t taken;
@@ -161,6 +197,7 @@ TEST(ChoiceTest, TellsWhatTheNextBestIsWorseAt) {
         Case{{good, same, mixed}, 0, "next comes same, 0.5 decibels behind"},
         Case{{good, filmed}, 0, ""}, Case{{good, filmed, mixed}, 1, ""},
         Case{{black, good}, 1, "next comes black, which leaves 2.0 % of a frame black"},
+        Case{{near, good}, 1, "next comes near, which enlarges 1.62 times"},
         Case{{good, far, black},
              0,
              "next comes far, 7.0 decibels behind: it keeps less of the width (50 % against 85 %), "
@@ -177,13 +214,16 @@ TEST(ChooserTest, ATextBringsTheChoiceBack) {
   const SolvedClip clip = Filmed(15);
   Chooser first(clip, {.zoom_speed = 2.5});
   first.Consider(kBent, clip);
-  first.Consider({.name = "calmer", .changes = {{20, 80}, {281, 0}}, .warps = Warps::none}, clip);
+  first.Consider(
+      {.name = "calmer", .changes = {{20, 80}, {281, 0}}, .warps = Warps::none, .fills = false},
+      clip);
   const std::string text = first.choice().Json().dump();
   const std::optional<Choice> read = Choice::Parse(text);
   ASSERT_TRUE(read);
   EXPECT_EQ(read->taken, 1u);
   EXPECT_EQ(read->zoom_speed, 2.5);
   EXPECT_EQ(read->best().changes, (ParamValues{{20, 80}, {281, 0}}));
+  EXPECT_FALSE(read->best().fills);
   EXPECT_EQ(read->Json().dump(), text);
   Chooser again(clip, {.zoom_speed = 2.5});
   again.Take(*read, clip);
