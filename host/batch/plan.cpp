@@ -153,8 +153,8 @@ std::optional<Record> DoneRecord(const Plan& plan, const Task& task) {
 std::int64_t ExpectedMemory(double width, double height, double frames) {
   constexpr double kDecodedBytesAPixel = 1.5;  // 4:2:0 of 8 bits
   const double pixels = width * height;
-  const double kept = std::min(static_cast<double>(MostKept(pixels, false)),
-                               kDecodedBytesAPixel * pixels * frames);
+  const double kept =
+      std::min(static_cast<double>(MostKept(pixels, false)), kDecodedBytesAPixel * pixels * frames);
   return static_cast<std::int64_t>(kProgramBytes + kBytesAPixel * pixels + kBytesAFrame * frames +
                                    kept);
 }

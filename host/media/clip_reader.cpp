@@ -135,7 +135,7 @@ class FfmpegReader final : public ClipReader {
   std::shared_ptr<const FrameList> list_;           // null during the first pass
   FrameToPixels to_pixels_;
   std::unique_ptr<FirstPass> first_pass_;
-  std::optional<FrameFinder> finder_;  // from the first frame on that is decoded behind that
+  std::optional<FrameFinder> finder_;       // from the first frame on that is decoded behind that
   const std::shared_ptr<KeptFrames> kept_;  // never null
   FramePtr last_;
   std::size_t last_number_ = 0;

@@ -305,11 +305,11 @@ TEST(BatchMachineTest, WhatARunKeepsGoesByItsFramesAndItsPartOfTheMachine) {
     bool deep;
     std::int64_t least, most;  // MiB
   } cases[] = {
-      {1 << 14, 0, k720p, false, 262, 263}, {1 << 14, 9, k720p, false, 262, 263},
-      {1 << 14, 1, k720p, false, 65, 66},   {1 << 14, 0, k720p, true, 174, 175},
+      {1 << 14, 0, k720p, false, 262, 263},  {1 << 14, 9, k720p, false, 262, 263},
+      {1 << 14, 1, k720p, false, 65, 66},    {1 << 14, 0, k720p, true, 174, 175},
       {1 << 14, 0, k1080p, false, 152, 153}, {1 << 14, 0, k1080p, true, 0, 0},
-      {1 << 14, 0, k2160p, false, 0, 0},    {400, 0, k720p, false, 100, 100},
-      {400, 1, k720p, false, 25, 25},       {0, 0, k720p, false, 0, 0},
+      {1 << 14, 0, k2160p, false, 0, 0},     {400, 0, k720p, false, 100, 100},
+      {400, 1, k720p, false, 25, 25},        {0, 0, k720p, false, 0, 0},
   };
   for (const auto& given : cases) {
     const Machine machine{.processors = 4, .memory = given.memory * kMiB};
