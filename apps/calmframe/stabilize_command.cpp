@@ -12,6 +12,7 @@
 #include "apps/calmframe/flags.h"
 #include "apps/calmframe/project_work.h"
 #include "apps/calmframe/render_clip.h"
+#include "host/batch/machine.h"
 #include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
 #include "platform/tessel/threads.h"
@@ -201,6 +202,9 @@ void Stabilize(const std::string& input, const std::string& output, const std::s
   RunOnPromises([&](host::Opening opening) {
     const std::unique_ptr<host::Film> film = TakeUp(input, project, opening, stretch, shots);
     const media::ClipInfo info = film->info();
+    film->KeepDecoded(static_cast<std::size_t>(
+        batch::BytesToKeep(batch::ThisMachine(), threads,
+                           static_cast<double>(info.width) * info.height, info.bit_depth > 8)));
     if (!info.warning.empty()) progress.Warn(info.warning);
     KeepApart(output, {project});
     // Made first, so that an output that cannot be written costs nobody an analysis.

@@ -1,6 +1,7 @@
 #include "host/batch/machine.h"
 
 #include <sched.h>
+#include <sys/resource.h>
 
 #include <algorithm>
 #include <cmath>
@@ -76,6 +77,23 @@ Machine ThisMachine() {
   });
   machine.processors = std::max(machine.processors, 1);
   return machine;
+}
+
+std::int64_t MostKept(double pixels, bool deep) {
+  // Measured, rounded up: of the program, and of the frames that an analysis and a render have in
+  // work.
+  constexpr double kTogether = 410 << 20, kProgram = 60 << 20, kBytesAPixel = 100;
+  const double left = kTogether - kProgram - (deep ? 2 : 1) * kBytesAPixel * pixels;
+  return static_cast<std::int64_t>(std::max(left, 0.0));
+}
+
+std::int64_t BytesToKeep(const Machine& machine, int threads, double pixels, bool deep) {
+  for (const auto resource : {RLIMIT_AS, RLIMIT_DATA}) {
+    rlimit limit{};
+    if (getrlimit(resource, &limit) == 0 && limit.rlim_cur != RLIM_INFINITY) return 0;
+  }
+  const int part = threads > 0 ? std::min(threads, machine.processors) : machine.processors;
+  return std::min(MostKept(pixels, deep), machine.memory / 4) / machine.processors * part;
 }
 
 }  // namespace calmframe::batch

@@ -15,6 +15,7 @@
 #include "host/base/json_depth.h"
 #include "host/base/shown_text.h"
 #include "host/batch/child.h"
+#include "host/batch/machine.h"
 #include "host/media/clip.h"
 #include "host/media/glance.h"
 #include "platform/tessel/threads.h"
@@ -150,8 +151,12 @@ std::optional<Record> DoneRecord(const Plan& plan, const Task& task) {
 }
 
 std::int64_t ExpectedMemory(double width, double height, double frames) {
-  return static_cast<std::int64_t>(kProgramBytes + kBytesAPixel * width * height +
-                                   kBytesAFrame * frames);
+  constexpr double kDecodedBytesAPixel = 1.5;  // 4:2:0 of 8 bits
+  const double pixels = width * height;
+  const double kept =
+      std::min(static_cast<double>(MostKept(pixels, false)), kDecodedBytesAPixel * pixels * frames);
+  return static_cast<std::int64_t>(kProgramBytes + kBytesAPixel * pixels + kBytesAFrame * frames +
+                                   kept);
 }
 
 std::string GlanceText(const std::string& path) {

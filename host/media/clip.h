@@ -136,6 +136,12 @@ class ClipReader {
   // its frames, but decodes first what is still promised. Throws Failure (input).
   virtual std::unique_ptr<ClipReader> Again() { return Open(info().path); }
 
+  // Of a clip whose frames are read in order, and then once more by this reader or by others made
+  // of it: from now on the last of those that are read, as many as fit in `bytes`, stay as they
+  // were decoded. 0, as at first: no more do, and those that did go as they are read. A frame is
+  // the same either way.
+  virtual void KeepDecoded(std::size_t /*bytes*/) {}
+
   virtual const ClipInfo& info() const = 0;
   // Null of a clip that is made, not read.
   virtual std::shared_ptr<const FoundFrames> found() const { return nullptr; }

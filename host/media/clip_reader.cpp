@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <optional>
 #include <stdexcept>
 #include <utility>
@@ -8,6 +9,7 @@
 #include "host/media/first_pass.h"
 #include "host/media/frame_index.h"
 #include "host/media/frame_list.h"
+#include "host/media/kept_frames.h"
 #include "host/media/pixel_conversion.h"
 
 namespace calmframe::media {
@@ -18,19 +20,19 @@ constexpr std::size_t kSkippedAtMost = 8;
 
 class FfmpegReader final : public ClipReader {
  public:
-  explicit FfmpegReader(std::shared_ptr<const FrameList> list)
-      : info_(list->info), list_(std::move(list)), to_pixels_(info_) {
-    Find();
-  }
+  explicit FfmpegReader(std::shared_ptr<const FrameList> list,
+                        std::shared_ptr<KeptFrames> kept = std::make_shared<KeptFrames>())
+      : info_(list->info), list_(std::move(list)), to_pixels_(info_), kept_(std::move(kept)) {}
   explicit FfmpegReader(std::unique_ptr<FirstPass> first_pass)
       : info_(first_pass->promised()),
         promised_(first_pass->frames()),
         to_pixels_(info_),
-        first_pass_(std::move(first_pass)) {}
+        first_pass_(std::move(first_pass)),
+        kept_(std::make_shared<KeptFrames>()) {}
 
   std::unique_ptr<ClipReader> Again() override {
     LeaveFirstPass();
-    return std::make_unique<FfmpegReader>(list_);
+    return std::make_unique<FfmpegReader>(list_, kept_);
   }
 
   const ClipInfo& info() const override { return info_; }
@@ -38,7 +40,12 @@ class FfmpegReader final : public ClipReader {
     if (promised_) return promised_;
     return list_;
   }
-  bool BeginsAsListed() { return finder_->BeginsAs(info_); }
+  bool BeginsAsListed() {
+    Find();
+    return finder_->BeginsAs(info_);
+  }
+
+  void KeepDecoded(std::size_t bytes) override { kept_->SetBound(bytes); }
 
   void Read(std::size_t frame, HX_Pixel8* pixels, std::ptrdiff_t row_bytes) override {
     ReadAs(frame, pixels, row_bytes);
@@ -71,6 +78,16 @@ class FfmpegReader final : public ClipReader {
   // Leaves the frame in last_.
   void Fetch(std::size_t frame) {
     if (last_ && last_number_ == frame) return;
+    if (FramePtr kept = found()->standing() != Standing::broken ? kept_->Take(frame) : nullptr) {
+      last_ = std::move(kept);
+      last_number_ = frame;
+      return;
+    }
+    Decode(frame);
+    kept_->Keep(frame, *last_);
+  }
+
+  void Decode(std::size_t frame) {
     const std::size_t begin = first_pass_ ? first_pass_->range().first : 0;
     const bool ascending = last_ ? frame == last_number_ + 1 : frame == begin;
     last_.reset();
@@ -79,6 +96,7 @@ class FfmpegReader final : public ClipReader {
       ahead_.reset();
     }
     if (!ahead_ && first_pass_ && (frame != begin || first_pass_->begun())) LeaveFirstPass();
+    if (!first_pass_ && !finder_) Find();
     if (!ahead_ && ascending) {
       ahead_.emplace(
           [this](std::size_t number, const std::atomic<bool>& stop) {
@@ -96,17 +114,17 @@ class FfmpegReader final : public ClipReader {
     last_number_ = frame;
   }
 
-  // Nobody decodes ahead of himself into what isn't known.
+  // Nobody decodes ahead of himself into what isn't known, or what is decoded.
   std::size_t EndAhead(std::size_t frame) const {
     const std::size_t known = first_pass_ ? first_pass_->range().end : list_->known.end;
-    return frame < known ? known : info_.frame_count;
+    const std::size_t end = frame < known ? known : info_.frame_count;
+    return std::min(end, kept_->From(frame).value_or(end));
   }
 
   void LeaveFirstPass() {
     if (!first_pass_) return;
     ahead_.reset();
     list_ = first_pass_->Complete();
-    Find();  // may fail, and is tried again by the next frame
     first_pass_.reset();
   }
 
@@ -116,8 +134,9 @@ class FfmpegReader final : public ClipReader {
   std::shared_ptr<const PromisedFrames> promised_;  // null of a clip that was decoded at once
   std::shared_ptr<const FrameList> list_;           // null during the first pass
   FrameToPixels to_pixels_;
-  std::unique_ptr<FirstPass> first_pass_;  // or
-  std::optional<FrameFinder> finder_;
+  std::unique_ptr<FirstPass> first_pass_;
+  std::optional<FrameFinder> finder_;       // from the first frame on that is decoded behind that
+  const std::shared_ptr<KeptFrames> kept_;  // never null
   FramePtr last_;
   std::size_t last_number_ = 0;
   std::optional<DecodeAhead> ahead_;  // last: it uses one of these until it is gone

@@ -20,6 +20,8 @@ struct ClipMedium {
   SourcePtr source;
   std::shared_ptr<const media::FoundFrames> found;  // null: a stand-in for one that is gone
   std::size_t end = 0;  // behind the last frame that is to be worked of it
+  // Of decoded frames that an analysis leaves to the render behind it.
+  std::size_t kept_bytes = 0;
 };
 
 // Throws media::Failure where the frames are too small to be stabilized.

@@ -70,6 +70,10 @@ class Film {
   const media::FrameRange& range() const { return range_; }
   media::ClipInfo info() const { return media::PartOf(medium_.info, range_); }
 
+  // From the next shot on, what an analysis has decoded stays for the render behind it, as much as
+  // fits in `bytes`: for whoever draws each shot in order, right after its work.
+  void KeepDecoded(std::size_t bytes) { medium_.kept_bytes = bytes; }
+
   // Closes the shot that is open and opens the next; null behind the last one. Throws as
   // SteadyClip does.
   SteadyClip* Next();

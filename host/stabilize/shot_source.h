@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <map>
 #include <mutex>
@@ -25,6 +26,7 @@ class ShotSource final : public Source {
   const SourceInfo& info() const override { return source_->info(); }
   PicturePtr Fetch(std::int64_t frame, PixelKind kind) override;
   std::int64_t EndOfShot(std::int64_t frame) const override;
+  void KeepDecoded(std::size_t bytes) override { source_->KeepDecoded(bytes); }
 
   // Those that stand by now, oldest first.
   std::vector<ShotBorder> borders() const;

@@ -72,6 +72,20 @@ media::FrameRange RangeOf(const SavedShot& shot, const media::ClipInfo& clip) {
   return {static_cast<std::size_t>(first), static_cast<std::size_t>(end)};
 }
 
+// A source keeps what it decodes while this lives.
+class KeepingDecoded {
+ public:
+  KeepingDecoded(SourcePtr source, std::size_t bytes) : source_(std::move(source)) {
+    source_->KeepDecoded(bytes);
+  }
+  ~KeepingDecoded() { source_->KeepDecoded(0); }
+  KeepingDecoded(const KeepingDecoded&) = delete;
+  KeepingDecoded& operator=(const KeepingDecoded&) = delete;
+
+ private:
+  const SourcePtr source_;
+};
+
 // Shows nothing to a watcher who may stop the work all the same.
 class Unseen final : public Watcher {
  public:
@@ -109,6 +123,7 @@ WorkedEffect::WorkedEffect(const std::string& plugin, const ClipMedium& medium,
       range_(range),
       info_(media::PartOf(whole_, range_)),
       end_(medium.end),
+      kept_bytes_(medium.kept_bytes),
       found_(medium.found),
       host_(plugin, SettingsFor(info_)),
       session_(host_) {
@@ -233,6 +248,8 @@ auto WorkedEffect::Keeping(std::int32_t disk_id, const Act& act) {
 
 Reuse WorkedEffect::Work(Watcher& watcher) {
   if (is_worked_) return {true, true, true};
+  // All frames that it asks for are the analysis's.
+  const KeepingDecoded keeps(effect_->shared()->layer()->state()->source, kept_bytes_);
   const Reuse reuse =
       Keeping(HX_FRAMING.disk_id, [&](double framing) { return WorkFramedLast(framing, watcher); });
   is_worked_ = true;

@@ -133,7 +133,7 @@ class WorkedEffect {
   const media::ClipInfo whole_;
   media::FrameRange range_;
   media::ClipInfo info_;
-  const std::size_t end_;                                  // of the medium
+  const std::size_t end_, kept_bytes_;                     // of the medium
   const std::shared_ptr<const media::FoundFrames> found_;  // null of a stand-in
   Host host_;
   Session session_;

@@ -94,6 +94,11 @@ class ClipSource final : public Source {
     return picture;
   }
 
+  void KeepDecoded(std::size_t bytes) override {
+    std::lock_guard lock(mutex_);
+    cursors_[0].reader->KeepDecoded(bytes);
+  }
+
  private:
   struct Cursor {
     std::unique_ptr<media::ClipReader> reader;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <boost/shared_ptr.hpp>
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <limits>
@@ -43,6 +44,9 @@ class Source {
   // frame of the next, or kNoEnd. Never grows.
   virtual std::int64_t EndOfShot(std::int64_t /*frame*/) const { return kNoEnd; }
   static constexpr std::int64_t kNoEnd = std::numeric_limits<std::int64_t>::max();
+
+  // Of frames that are fetched in about ascending order, and then once more; see ClipReader.
+  virtual void KeepDecoded(std::size_t /*bytes*/) {}
 };
 
 using SourcePtr = boost::shared_ptr<Source>;

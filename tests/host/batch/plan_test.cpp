@@ -295,5 +295,30 @@ TEST(BatchMachineTest, JobsGoByProcessorsAndMemoryUnlessTheyAreSet) {
   EXPECT_EQ(SettingsFor(8, 1000, 3).memory, 0);
 }
 
+TEST(BatchMachineTest, WhatARunKeepsGoesByItsFramesAndItsPartOfTheMachine) {
+  constexpr std::int64_t kMiB = 1 << 20;
+  constexpr double k720p = 1280 * 720, k1080p = 1920 * 1080, k2160p = 4 * k1080p;
+  const struct {
+    std::int64_t memory;
+    int threads;
+    double pixels;
+    bool deep;
+    std::int64_t least, most;  // MiB
+  } cases[] = {
+      {1 << 14, 0, k720p, false, 262, 263},  {1 << 14, 9, k720p, false, 262, 263},
+      {1 << 14, 1, k720p, false, 65, 66},    {1 << 14, 0, k720p, true, 174, 175},
+      {1 << 14, 0, k1080p, false, 152, 153}, {1 << 14, 0, k1080p, true, 0, 0},
+      {1 << 14, 0, k2160p, false, 0, 0},     {400, 0, k720p, false, 100, 100},
+      {400, 1, k720p, false, 25, 25},        {0, 0, k720p, false, 0, 0},
+  };
+  for (const auto& given : cases) {
+    const Machine machine{.processors = 4, .memory = given.memory * kMiB};
+    const std::int64_t kept = BytesToKeep(machine, given.threads, given.pixels, given.deep);
+    SCOPED_TRACE(testing::Message() << given.memory << " " << given.threads << " " << kept);
+    EXPECT_GE(kept, given.least * kMiB);
+    EXPECT_LE(kept, given.most * kMiB);
+  }
+}
+
 }  // namespace
 }  // namespace calmframe::batch

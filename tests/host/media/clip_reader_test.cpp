@@ -93,6 +93,36 @@ TEST_F(ClipReaderTest, EachWayInAndAnyOrderGivesTheFramesThatTheSequenceGives) {
       ask(*part_known, i);
     }
     ReadFrame(*ClipReader::Open(In(clip.name)), 0);  // and dropped while it decodes ahead
+    // Read once, the last ones are there for another reader; those before them need the file.
+    constexpr std::size_t kBound = 300'000, kLeastAFrame = 96 * 64 * 3 / 2;  // bytes
+    const auto once = ClipReader::OpenPromised(In(clip.name));
+    const auto keep = [&] {
+      once->KeepDecoded(kBound);
+      for (std::size_t i = 0; i < clip.frames; ++i) ReadFrame(*once, i);
+      once->KeepDecoded(0);
+    };
+    keep();
+    auto twice = once->Again();
+    for (std::size_t i = 0; i < clip.frames; ++i) {
+      EXPECT_TRUE(SamePixels(ReadFrame(*twice, i), frames[i])) << i << ", kept or decoded anew";
+    }
+    keep();
+    twice = once->Again();
+    std::filesystem::rename(In(clip.name), In("gone"));
+    std::size_t first = clip.frames;
+    const auto is_there = [&](std::size_t i) {
+      try {
+        EXPECT_TRUE(SamePixels(ReadFrame(*twice, i), frames[i])) << i << ", kept";
+        return true;
+      } catch (const Failure&) {
+        return false;
+      }
+    };
+    while (first > 0 && is_there(first - 1)) --first;
+    EXPECT_GE(clip.frames - first, 3u);
+    EXPECT_LE(clip.frames - first, kBound / kLeastAFrame);
+    EXPECT_FALSE(is_there(clip.frames - 2)) << "it went as it was read";
+    std::filesystem::rename(In("gone"), In(clip.name));
   }
 }
 
