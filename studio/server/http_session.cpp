@@ -12,7 +12,7 @@
 #include <string_view>
 #include <utility>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 #include "studio/server/page_files.h"
 #include "studio/server/trust.h"
 
@@ -179,7 +179,7 @@ class Session : public std::enable_shared_from_this<Session> {
     if (Header(http::field::content_type).substr(0, 16) != "application/json") {
       return Fail(http::status::unsupported_media_type, "JSON is wanted");
     }
-    if (NestsTooDeep(body)) return Fail(http::status::bad_request, "it is nested too deep");
+    if (ExceedsBounds(body)) return Fail(http::status::bad_request, "it is nested too deep, or has too many parts");
     const nlohmann::json asked = nlohmann::json::parse(body, nullptr, false);
     if (!asked.is_object()) return Fail(http::status::bad_request, "an object is wanted");
     stream_.expires_never();  // a save waits for a solve

@@ -6,7 +6,7 @@
 #include <optional>
 #include <utility>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 #include "host/batch/child.h"
 
 namespace calmframe::studio {
@@ -18,7 +18,7 @@ struct ProgramRun::Listener {
 
   void Hear(const std::string& line) {
     const nlohmann::json told =
-        NestsTooDeep(line) ? nlohmann::json() : nlohmann::json::parse(line, nullptr, false);
+        ExceedsBounds(line) ? nlohmann::json() : nlohmann::json::parse(line, nullptr, false);
     if (!told.is_object()) {
       error = line;
       return;

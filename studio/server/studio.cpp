@@ -132,7 +132,7 @@ void Studio::StopAll() {
 }
 
 void Studio::Restore() {
-  const auto kept = batch::ReadObject(folder_ + kSession);
+  const auto kept = batch::ReadObject(folder_ + kSession, batch::kMostOfAll);
   if (!kept) return;
   try {
     secret_ = kept->value("secret", "");
