@@ -77,7 +77,7 @@ TEST_F(RunTaskTest, AClipIsDoneOnceAndAgainWhenItChanges) {
   Does(R"(echo '{"stage":"rendering","share":0.5}'
 echo no json; echo '[1]'; echo '{"stage":7}'
 echo "{\"warning\":\"$2: dark\"}" >&2; echo "{\"warning\":\"$2: dark\"}" >&2
-for n in $(seq 300); do printf '{"warning":"%d%05000d"}\n' $n 0; done
+for n in $(seq 300); do printf '{"warning":"%03d%05000d"}\n' $n 0; done
 echo '{"width_kept":0.9,"most_zoom":1.1}')");
   Silent watcher;
   const TaskResult first = RunTask(plan, task, 1, watcher);
