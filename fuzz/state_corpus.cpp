@@ -4,6 +4,9 @@
 
 #include "fuzz/seeds.h"
 #include "fuzz/state_input.h"
+#include "stabilizer/effect/src/state_format/format.h"
+#include "stabilizer/effect/src/state_format/state_reader.h"
+#include "stabilizer/effect/src/state_format/state_writer.h"
 #include "tests/stabilizer/effect/state_format/samples.h"
 
 int main(int argc, char** argv) {
@@ -19,5 +22,15 @@ int main(int argc, char** argv) {
     add(sample.version, kAsItStands, sample.deflated);
     add(sample.version, 0, sample.plain);
     add(sample.version, kOneByOne, sample.plain);
+    try {
+      const SourceShape present{64, 36, 1, 1};
+      tessel::filesupport::OStringByteStream out;
+      WriteState(out,
+                 ReadState(sample.plain.data(), sample.plain.size(), sample.version, HX_PAYLOAD_RAW,
+                           present),
+                 state_format::PayloadForm::packed);
+      add(state_format::kPresentVersion, kPacked, out.Take());
+    } catch (const StateRefused&) {  // one of the samples that are
+    }
   }
 }

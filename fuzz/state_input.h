@@ -12,6 +12,7 @@ enum : std::uint8_t {
   kAsItStands = 1,  // the payload is deflated already, or is to be read as if it were
   kOneByOne = 2,    // the present source
   kAnamorphic = 4,  // the present source
+  kPacked = 8,      // the payload, as a host has it in memory, of the present version alone
 };
 
 inline std::string StateInput(std::uint32_t version, std::uint8_t flags,

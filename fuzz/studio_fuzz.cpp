@@ -21,7 +21,7 @@
 #include "fuzz/studio_input.h"
 #include "studio/server/http_session.h"
 #include "studio/wire/message.h"
-#include "studio/wire/settings.h"
+#include "studio/wire/told.h"
 
 namespace {
 
@@ -110,6 +110,23 @@ class Room {
   std::unique_ptr<tcp::acceptor> acceptor_;
 };
 
+// What is heard of it is heard again as the same.
+void TakeAsHeard(const Message& message) try {
+  if (message.head.contains("tells")) {
+    const nlohmann::json told = ToldOf(message.head["tells"]);
+    if (ToldOf(told) != told) std::abort();
+    return;
+  }
+  constexpr int kWidth = 640;
+  for (const char* op : {"panel", "curves", "lasso", "frame", "save"}) {
+    const Message once = AnswerOf(op, kWidth, message);
+    const Message again = AnswerOf(op, kWidth, once);
+    if (again.head != once.head || again.bytes != once.bytes) std::abort();
+  }
+} catch (const BadMessage&) {
+} catch (const std::invalid_argument&) {
+}
+
 // In pieces as small as they come; each message is taken as both ends take it.
 void TakeApart(const std::string& input) {
   MessageReader reader;
@@ -122,7 +139,7 @@ void TakeApart(const std::string& input) {
         again.Add(once.data(), once.size());
         const std::optional<Message> same = again.Next();
         if (!same || Encode(*same) != once) std::abort();
-        if (message->head.contains("settings")) JsonOf(SettingsOf(message->head["settings"]));
+        TakeAsHeard(*message);
       }
     }
   } catch (const BadMessage&) {

@@ -53,8 +53,8 @@ bool PackedCells::AppendPacked(std::vector<std::uint8_t> bytes) {
 
 bool PackedCells::Unpack(std::span<const std::uint8_t> bytes,
                          std::vector<std::int32_t>& words) const {
-  // A row has a byte for each group of words at least: no memory is taken on a count's word alone.
-  if (bytes.size() < 3 * slots_ / 16) return false;
+  // No memory is taken on a count's word alone.
+  if (bytes.size() < memory::LeastPacked(3 * slots_)) return false;
   words.resize(3 * slots_);
   const std::span<std::int32_t> all(words);
   std::size_t place = 0;

@@ -66,11 +66,13 @@ Child::~Child() {
 
 Child::Said Child::Next(std::string& line, int milliseconds) {
   for (;;) {
-    if (const std::size_t end = text_.find('\n'); end != std::string::npos) {
+    if (const std::size_t end = text_.find('\n', looked_); end != std::string::npos) {
       line = text_.substr(0, end);
       text_.erase(0, end + 1);
+      looked_ = 0;
       return Said::line;
     }
+    looked_ = text_.size();
     pollfd waited{says_, POLLIN, 0};
     const int ready = poll(&waited, 1, milliseconds);
     if (ready == 0 || (ready < 0 && errno == EINTR)) return Said::nothing;
@@ -90,6 +92,7 @@ Child::Said Child::Next(std::string& line, int milliseconds) {
     if (text_.empty()) return Said::end;
     line.swap(text_);
     text_.clear();
+    looked_ = 0;
     return Said::line;
   }
 }

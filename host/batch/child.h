@@ -36,6 +36,7 @@ class Child {
   pid_t process_ = -1;
   int says_ = -1;
   std::string text_;
+  std::size_t looked_ = 0;  // bytes at its front without a newline
   bool is_asked_ = false;
   bool has_ended_ = false;
 };

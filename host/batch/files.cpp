@@ -12,7 +12,7 @@
 #include <nlohmann/json.hpp>
 #include <system_error>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 #include "host/batch/clip_names.h"
 #include "host/media/output_file.h"
 
@@ -64,11 +64,10 @@ void SweepParts(const std::string& folder) {
   }
 }
 
-std::optional<nlohmann::ordered_json> ReadObject(const std::string& path) {
+std::optional<nlohmann::ordered_json> ReadObject(const std::string& path, std::int64_t most) {
   // In a folder that others write into there may be anything, such as a pipe that nobody feeds.
-  constexpr std::int64_t kMostBytes = std::int64_t{256} << 20;
   const auto there = IdentityOf(path);
-  if (!there || there->size > kMostBytes) return std::nullopt;
+  if (!there || there->size > most) return std::nullopt;
   std::string text;
   try {
     std::ifstream file(path, std::ios::binary);
@@ -76,7 +75,7 @@ std::optional<nlohmann::ordered_json> ReadObject(const std::string& path) {
   } catch (const std::ios_base::failure&) {  // of the disk, which iterators throw
     return std::nullopt;
   }
-  if (NestsTooDeep(text)) return std::nullopt;
+  if (ExceedsBounds(text)) return std::nullopt;
   auto object = nlohmann::ordered_json::parse(text, nullptr, false);
   if (!object.is_object()) return std::nullopt;
   return object;

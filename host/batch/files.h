@@ -28,8 +28,15 @@ bool WriteWhole(const std::string& path, const std::string& text);
 // Removes what a program that was killed was writing into a folder; for whoever holds its lock.
 void SweepParts(const std::string& folder);
 
-// The file as an object; none where it isn't there, is anything else, or is larger than any.
-std::optional<nlohmann::ordered_json> ReadObject(const std::string& path);
+// What a run writes of a task is far smaller.
+inline constexpr std::int64_t kMostOfATask = std::int64_t{16} << 20;  // bytes
+// What one program writes for the next, of all its tasks or clips.
+inline constexpr std::int64_t kMostOfAll = std::int64_t{256} << 20;
+
+// The file as an object; none where it isn't there, is anything else, or is larger than `most`
+// bytes, or than json_bounds has it.
+std::optional<nlohmann::ordered_json> ReadObject(const std::string& path,
+                                                 std::int64_t most = kMostOfATask);
 
 // A lock that the kernel gives back when the last process that holds the descriptor has ended,
 // however that comes; between machines too, where the file system hands locks on (NFS 4 does).

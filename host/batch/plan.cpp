@@ -12,7 +12,7 @@
 #include <system_error>
 #include <utility>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 #include "host/base/shown_text.h"
 #include "host/batch/child.h"
 #include "host/batch/machine.h"
@@ -78,7 +78,7 @@ std::size_t Glances(const std::string& program, const std::vector<Task*>& tasks,
     const Child::Said said = child.Next(line, kPatience);
     if (said == Child::Said::end || stops()) break;
     if (said == Child::Said::nothing) continue;
-    if (NestsTooDeep(line)) continue;
+    if (ExceedsBounds(line)) continue;
     const auto json = nlohmann::ordered_json::parse(line, nullptr, false);
     if (!json.is_object()) continue;  // what a library says
     Take(json, *tasks[done++]);

@@ -15,7 +15,7 @@
 #include <system_error>
 #include <utility>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 #include "host/base/shown_text.h"
 #include "host/batch/child.h"
 #include "host/media/clip.h"
@@ -28,6 +28,9 @@ namespace {
 
 namespace fs = std::filesystem;
 using Clock = std::chrono::steady_clock;
+
+// Of what a program says of its clip, which may have taken it over.
+constexpr std::size_t kMostWarnings = 200, kLongestLine = 4000;
 
 // Why a task can't go on; one line.
 struct Failed {
@@ -238,7 +241,7 @@ class Run {
   }
 
   void Hear(const std::string& line) {
-    if (NestsTooDeep(line)) return;
+    if (ExceedsBounds(line)) return;
     const auto json = nlohmann::ordered_json::parse(line, nullptr, false);
     if (!json.is_object()) return;
     try {
@@ -246,8 +249,9 @@ class Run {
         Tell(json.at("stage").get<std::string>(), json.value("share", 0.0));
       } else if (json.contains("warning")) {
         const std::string warning = Own(json.at("warning").get<std::string>());
-        if (std::find(record.warnings.begin(), record.warnings.end(), warning) ==
-            record.warnings.end()) {
+        if (record.warnings.size() < kMostWarnings &&
+            std::find(record.warnings.begin(), record.warnings.end(), warning) ==
+                record.warnings.end()) {
           record.warnings.push_back(warning);
         }
       } else if (json.contains("error")) {
@@ -264,6 +268,7 @@ class Run {
 
   // A line in the words of whoever asked for the clip.
   std::string Own(std::string line) const {
+    line.resize(std::min(line.size(), kLongestLine));
     ReplaceAll(line, task_.source, task_.clip);
     ReplaceAll(line, written_, task_.output);
     ReplaceAll(line, plan_.folder + "/", "");

@@ -127,7 +127,7 @@ void SlurmBatch::Adopt() {
   bool has_looked = false;
   for (const auto& entry :
        fs::directory_iterator(plan_.folder + "/" + kRecordsFolder + "/runs", error)) {
-    const auto json = ReadObject(entry.path() / "plan.json");
+    const auto json = ReadObject(entry.path() / "plan.json", kMostOfAll);
     const auto job = ReadObject(entry.path() / "job.json");
     if (!json || !job) continue;
     if (!has_looked && !Look()) return;
@@ -328,7 +328,7 @@ void SlurmBatch::Wait() {
 }
 
 void RunGroup(const std::string& path, std::size_t group, int threads, TaskWatcher& watcher) {
-  const auto json = ReadObject(path);
+  const auto json = ReadObject(path, kMostOfAll);
   if (!json) throw std::runtime_error(Shown(path) + ": is no plan of a batch");
   const Plan plan = PlanOf(json->at("plan").get<std::string>());
   for (const std::size_t n : json->at("groups").at(group).get<std::vector<std::size_t>>()) {

@@ -180,7 +180,7 @@ class ClipWriter {
   // frames (YUV4MPEG2) and nothing else, or with a codec Matroska (NUT where that can't hold it).
   // With one %d or %04d, or a / at its end: pictures, from number 1 on. Everything that can be
   // refused is refused here, so a program creates the writer before it spends time on the frames.
-  // Throws Failure (output).
+  // Throws Failure (output; input where the source's other streams are to be had no more).
   static std::unique_ptr<ClipWriter> Create(const std::string& path, const ClipInfo& source,
                                             int width, int height, const EncodeSettings& settings);
   virtual ~ClipWriter() = default;

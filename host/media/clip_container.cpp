@@ -87,11 +87,7 @@ void ClipContainer::Begin(const Video& video, const ClipInfo& source,
   stream->avg_frame_rate = video.frame_rate;
   const bool raw_frames = std::strcmp(format_->name, "yuv4mpegpipe") == 0;
   if (!raw_frames && !pictures_ && !video_alone_ && !source.path.empty()) {
-    try {
-      copy_.emplace(source, shown_, *container, warnings);
-    } catch (const Failure& failure) {
-      warnings.push_back(std::string(failure.what()) + "; its other streams are left out");
-    }
+    copy_.emplace(source, shown_, *container, warnings);
   }
 
   if ((stream->codecpar->codec_id == AV_CODEC_ID_VP8 ||
@@ -144,7 +140,7 @@ void ClipContainer::CopyUntil(std::int64_t video_time) {
 void ClipContainer::CopyUntilCommon(std::int64_t time) {
   while (copy_ && copy_->time() <= time) {
     PacketPtr packet = copy_->Next();
-    if (!packet) break;
+    if (!packet) return TellEarlyEnd();
     const int stream = packet->stream_index;
     const int error = av_interleaved_write_frame(container_.get(), packet.get());
     CheckWritten();
@@ -155,6 +151,14 @@ void ClipContainer::CopyUntilCommon(std::int64_t time) {
       if (warnings_->empty() || warnings_->back() != line) warnings_->push_back(line);
     }
   }
+}
+
+// Of what can't be read the picture tells too, but another way.
+void ClipContainer::TellEarlyEnd() {
+  if (copy_->error() == 0 || told_early_end_) return;
+  told_early_end_ = true;
+  warnings_->push_back(shown_ + ": the other streams of the clip can't be read to their end: " +
+                       ErrorText(copy_->error()));
 }
 
 void ClipContainer::Finish() {

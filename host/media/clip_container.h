@@ -53,6 +53,7 @@ class ClipContainer {
   static int CloseAndKeepError(AVFormatContext* container, AVIOContext* file);
   void WriteHeader();
   void CopyUntilCommon(std::int64_t time);
+  void TellEarlyEnd();
   void CheckIndex() const;
 
   const std::string shown_;
@@ -68,6 +69,7 @@ class ClipContainer {
   bool headed_ = false;
   std::optional<StreamCopy> copy_;
   std::vector<std::string>* warnings_ = nullptr;
+  bool told_early_end_ = false;
 };
 
 }  // namespace calmframe::media

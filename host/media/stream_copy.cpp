@@ -192,7 +192,7 @@ bool StreamCopy::Cut(const AVStream& from, AVPacket& packet) {
 PacketPtr StreamCopy::Next() {
   if (to_.empty()) return nullptr;
   PacketPtr packet = NewPacket();
-  while (av_read_frame(input_.get(), packet.get()) >= 0) {
+  while ((error_ = av_read_frame(input_.get(), packet.get())) >= 0) {
     const auto found = to_.find(packet->stream_index);
     if (found == to_.end()) {
       av_packet_unref(packet.get());
@@ -214,7 +214,10 @@ PacketPtr StreamCopy::Next() {
       const bool beyond =
           packet->dts != AV_NOPTS_VALUE && av_rescale_q(packet->dts, from, AV_TIME_BASE_Q) >
                                                length_.In(AV_TIME_BASE_Q) + kInterleaving;
-      if (beyond) return nullptr;
+      if (beyond) {
+        error_ = 0;
+        return nullptr;
+      }
       av_packet_unref(packet.get());
       continue;
     }
@@ -233,6 +236,7 @@ PacketPtr StreamCopy::Next() {
     }
     return packet;
   }
+  if (error_ == AVERROR_EOF) error_ = 0;
   return nullptr;
 }
 

@@ -19,7 +19,8 @@ class StreamCopy {
  public:
   // Adds to `output`, which holds the video stream and no header yet, every stream that its
   // container takes, the chapters and the metadata; names what is left out in `warnings`. Of a part
-  // it is what lies within it, counted from its first frame; see ClipWriter.
+  // it is what lies within it, counted from its first frame; see ClipWriter. Throws Failure where
+  // the source can't be opened any more.
   StreamCopy(const ClipInfo& source, const std::string& shown, AVFormatContext& output,
              std::vector<std::string>& warnings);
 
@@ -28,6 +29,8 @@ class StreamCopy {
 
   // The next packet with its stream and times in `output`, null at the end.
   PacketPtr Next();
+  // FFmpeg's number for why that came early; 0 where it did not.
+  int error() const { return error_; }
   // Time of the last packet that Next gave, in AV_TIME_BASE ticks of the output.
   std::int64_t time() const { return time_; }
 
@@ -51,6 +54,7 @@ class StreamCopy {
   Time length_;          // of the part
   std::set<int> begun_;  // input streams of which a packet lies in the part
   std::int64_t time_ = INT64_MIN;
+  int error_ = 0;
   std::map<int, int> to_;                 // output stream by input stream
   std::map<int, std::int64_t> last_dts_;  // by output stream
 };

@@ -80,7 +80,9 @@ class LayoutReader {
     in_ >> layout_.first_frame;
     layout_.tracks = in_.position();
     if (is_packed_) {
-      SkipPacked(0, layout_.packed_tracks);
+      const auto slots = static_cast<std::size_t>(layout_.slots);
+      SkipPacked(0, memory::LeastPacked(2 * slots) + memory::LeastPacked(slots),
+                 layout_.packed_tracks);
     } else {
       Skip(layout_.cells(), kPositionBytes + kStatusBytes);
     }
@@ -114,12 +116,14 @@ class LayoutReader {
     }
   }
 
-  // One record a frame: so many bytes, then a count, and as many.
-  void SkipPacked(std::uint64_t ahead, std::vector<std::size_t>& places) {
+  // One record a frame: so many bytes, then a count, at least so much, and as many.
+  void SkipPacked(std::uint64_t ahead, std::size_t least, std::vector<std::size_t>& places) {
     for (std::int32_t f = 0; f < layout_.frames; ++f) {
       places.push_back(in_.position());
       Skip(1, ahead);
-      Skip(Next<std::uint32_t>(), 1);
+      const auto size = Next<std::uint32_t>();
+      Check(size >= least, "a packed record of fewer bytes than it takes");
+      Skip(size, 1);
     }
   }
 
@@ -160,7 +164,7 @@ class LayoutReader {
           "no grid");
     layout_.warps = in_.position();
     if (is_packed_) {
-      SkipPacked(kCornerBytes, layout_.packed_warps);
+      SkipPacked(kCornerBytes, memory::LeastPacked(2 * layout_.vertices()), layout_.packed_warps);
     } else {
       Skip(static_cast<std::uint64_t>(layout_.frames),
            kCornerBytes + layout_.vertices() * kOffsetBytes);

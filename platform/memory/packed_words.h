@@ -11,6 +11,11 @@ namespace memory {
 // how many bits its widest word takes and then all 16 in so many. A word counts as signed, 0, -1,
 // 1, -2 ... being the narrowest. Any words come back as they were.
 
+// Bytes that so many words take at least: whoever has fewer need take no memory for the words.
+constexpr std::size_t LeastPacked(std::size_t words) {
+  return (words + 15) / 16;
+}
+
 // Appends to `bytes`.
 void PackWords(std::span<const std::int32_t> words, std::vector<std::uint8_t>& bytes);
 

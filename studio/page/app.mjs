@@ -3,8 +3,9 @@ import {html, render, useCallback, useEffect, useMemo, useRef, useState} from '.
 import {Chart} from './chart.mjs';
 import {Chooser} from './chooser.mjs';
 import {ClipList} from './clip_list.mjs';
-import {ask, folderOf, frameAddress, leftText, stemOf, timeText, useStudio} from './link.mjs';
+import {ask, fixed, folderOf, frameAddress, leftText, percent, stemOf, timeText, useStudio} from './link.mjs';
 import {Panel} from './panel.mjs';
+import {Part, Still} from './part.mjs';
 import {Player} from './player.mjs';
 import {RenderDialog, RenderList} from './render.mjs';
 import {T} from './texts.mjs';
@@ -36,7 +37,7 @@ function Strip({clip, seek}) {
   const count = 12, last = clip.info.frames - 1;
   return html`<div class="strip" aria-hidden="true">${Array.from({length: count}, (_, i) => {
     const frame = Math.round(last * i / (count - 1));
-    return html`<img key=${frame} alt="" loading="lazy" src=${frameAddress(clip, 'before', frame, 96)} onClick=${() => seek(frame)} />`;
+    return html`<${Still} key=${frame} loading="lazy" address=${frameAddress(clip, 'before', frame, 96)} onClick=${() => seek(frame)} />`;
   })}</div>`;
 }
 
@@ -95,16 +96,16 @@ function Summary({clip}) {
       ${clip.error && html`<p class="error" role="alert">${clip.error}</p>`}
       ${outcome && clip.state !== 'failed' && html`
         <dl>
-          <div><dt>${T.facts[0]}</dt><dd>${outcome.shake_before.toFixed(1)} <i>→</i> ${outcome.shake_after.toFixed(1)}</dd></div>
-          <div><dt>${T.facts[1]}</dt><dd>${Math.round(outcome.width_kept * 100)} %</dd></div>
-          <div><dt>${T.facts[2]}</dt><dd>${outcome.most_zoom.toFixed(2)}×</dd></div>
-          <div><dt>${T.facts[3]}</dt><dd>${(outcome.most_black * 100).toFixed(1)} %</dd></div>
+          <div><dt>${T.facts[0]}</dt><dd>${fixed(outcome.shake_before, 1)} <i>→</i> ${fixed(outcome.shake_after, 1)}</dd></div>
+          <div><dt>${T.facts[1]}</dt><dd>${percent(outcome.width_kept)} %</dd></div>
+          <div><dt>${T.facts[2]}</dt><dd>${fixed(outcome.most_zoom, 2)}×</dd></div>
+          <div><dt>${T.facts[3]}</dt><dd>${percent(outcome.most_black, 1)} %</dd></div>
         </dl>`}
       ${choice && !clip.settings.window.as_set && clip.state !== 'failed' && html`
         <p class="hint"><b>${T.chosen}:</b> ${choice.text}${choice.why ? `; ${choice.why}` : ''}.</p>
         ${choice.candidates.length > 1 && html`
           <details class="ways"><summary>${T.otherWays}</summary><ul>
-            ${choice.candidates.map((way, i) => html`<li class=${way.taken ? 'taken' : ''}><span><b>${way.name}</b><i>${T.shake(way.shake_before.toFixed(1), way.shake_after.toFixed(1))} · ${T.kept(Math.round(way.width_kept * 100))}</i></span>
+            ${choice.candidates.map((way, i) => html`<li class=${way.taken ? 'taken' : ''}><span><b>${way.name}</b><i>${T.shake(fixed(way.shake_before, 1), fixed(way.shake_after, 1))} · ${T.kept(percent(way.width_kept))}</i></span>
               ${way.taken ? html`<em>${T.taken}</em>` : way.window === 'follow' ? html`<button class="quiet" title=${way.bends ? '' : T.unbent} onClick=${() => ask({op: 'way', clip: clip.id, way: i})}>${T.takeWay}</button>` : ''}</li>`)}
           </ul></details>`}`}
       ${clip.settings.window.as_set && clip.state === 'ready' && html`<p class="hint">${T.byHand}</p>`}
@@ -251,8 +252,8 @@ function App() {
                        [studio.heard, clip?.id]);
   const side = useMemo(() => clip && html`
     <aside class="side" aria-label=${T.controls}>
-      <${Summary} clip=${clip} />
-      <${Panel} key=${clip.id} clip=${clip} />
+      <${Part} of=${clip}><${Summary} clip=${clip} /><//>
+      <${Part} key=${clip.id} of=${clip}><${Panel} clip=${clip} /><//>
     </aside>`, [clip]);
   const folder = clip && folderOf(clip, studio.roots);
   const isEmpty = studio.loaded && !studio.order.length;
@@ -278,9 +279,9 @@ function App() {
           ${list}
           ${clip && html`
             <main class="centre">
-              <${Player} key=${clip.id} clip=${clip} frame=${frame} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} />
-              <${Transport} clip=${clip} frame=${frame} transport=${transport} update=${update} mode=${clip.picture ? mode : 'before'} setMode=${setMode} />
-              <${Chart} key=${clip.id} clip=${clip} frame=${frame} seek=${(to) => update({seek: to})} theme=${theme} />
+              <${Part} key=${`${clip.id} picture`} of=${clip}><${Player} clip=${clip} frame=${frame} mode=${clip.picture ? mode : 'before'} transport=${transport} onFrame=${setFrame} onStop=${() => update({speed: 0})} /><//>
+              <${Part} of=${clip}><${Transport} clip=${clip} frame=${frame} transport=${transport} update=${update} mode=${clip.picture ? mode : 'before'} setMode=${setMode} /><//>
+              <${Part} key=${`${clip.id} chart`} of=${clip}><${Chart} clip=${clip} frame=${frame} seek=${(to) => update({seek: to})} theme=${theme} /><//>
             </main>
             <nav class="switch" role="tablist" aria-label=${T.narrowTabs}>
               ${[['controls', T.controls], ['motion', T.motion], ['clips', T.clips]].map(([one, text]) => html`<button role="tab" aria-selected=${tab === one} onClick=${() => setTab(one)}>${text}</button>`)}

@@ -9,13 +9,15 @@ const KINDS = ['x', 'y', 'angle', 'zoom', 'window', 'black'];
 function columns(kind, shots, info) {
   const rows = info.interlaced ? 2 : 1;
   const seconds = [], before = [], after = [];
+  let end = 0;
   for (const shot of shots) {
     const curves = shot.curves;
-    if (!curves) continue;
+    if (!curves || shot.first < end) continue;  // what is drawn goes from left to right
+    end = shot.end;
     const list = kind === 'window' ? curves.zooms : kind === 'black' ? curves.black.map((share) => share === null ? null : share * 100) : curves.after[kind];
-    list.forEach((value, i) => {
+    list.slice(0, (end - shot.first) * rows).forEach((value, i) => {
       seconds.push((shot.first + i / rows) / info.rate);
-      before.push(kind in curves.before ? curves.before[kind][i] : null);
+      before.push(kind in curves.before ? curves.before[kind][i] ?? null : null);
       after.push(value);
     });
     // A gap, so that nothing is drawn from a shot to the next.

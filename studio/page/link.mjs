@@ -93,11 +93,26 @@ export function useDocument(path, clip, version) {
   const [held, hold] = useState({});
   useEffect(() => {
     if (!clip || !version) return undefined;
-    let wanted = true;
-    get(path, {clip}).then((document) => wanted && !document.error && hold({clip, document}));
-    return () => { wanted = false; };
+    let wanted = true, again = 0;
+    const fetchIt = async () => {
+      const document = await get(path, {clip});
+      if (!wanted) return;
+      if (!document.error) hold({clip, document});
+      else if (document.why === 'busy') again = setTimeout(fetchIt, 2000);
+    };
+    fetchIt();
+    return () => { wanted = false; clearTimeout(again); };
   }, [path, clip, version]);
   return held.clip === clip ? held.document : undefined;
+}
+
+// Figures as far as they could be measured.
+export function fixed(figure, digits) {
+  return Number.isFinite(figure) ? figure.toFixed(digits) : '–';
+}
+
+export function percent(share, digits = 0) {
+  return fixed(Number.isFinite(share) ? share * 100 : NaN, digits);
 }
 
 export function timeText(seconds) {

@@ -11,6 +11,7 @@ const WIDEST_PLAYING = 960;
 const WIDEST_STILL = 1920;
 const ROUGH = 640;      // width of a picture that is better than none
 const PATIENCE = 60;    // milliseconds that a picture may take before a rough one goes ahead of it
+const FARTHEST_BACK = 240;  // frames that a picture may be late
 const REST = 250;       // milliseconds without a change, after which nobody is in a hurry
 
 export const SIDES = {split: 'both', side: 'both', difference: 'both', before: 'before', after: 'after', tracks: 'tracks'};
@@ -54,6 +55,12 @@ class Pictures {
       if (wait > 0) this.again = setTimeout(this.arrived, wait);
       else this.fetch(address);
     }
+  }
+
+  stop() {
+    clearTimeout(this.again);
+    this.arrived = () => {};
+    for (const abort of this.running.values()) abort.abort();
   }
 
   async fetch(address) {
@@ -211,7 +218,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
         if (frame >= 0 && frame < of.info.frames) list.push(address(frame, wide));
       }
       let onView = address(how.frame, wide);
-      for (let back = 0; back <= 2 * of.info.rate; ++back) {
+      for (let back = 0; back <= Math.min(2 * of.info.rate, FARTHEST_BACK); ++back) {
         const near = [wide, less].map((one) => address(how.frame - sign * back, one)).find((one) => held.has(one));
         if (near) {
           onView = near;
@@ -290,6 +297,7 @@ export function Player({clip, mode, frame, transport, onFrame, onStop}) {
     return () => {
       ended = true;
       clearTimeout(timer);
+      engine.pictures.stop();
       watch.disconnect();
       document.removeEventListener('visibilitychange', engine.work);
     };

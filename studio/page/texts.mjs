@@ -61,6 +61,7 @@ export const T = {
   notYet: 'Not stabilized yet: this is the clip as it was shot.',
   working: 'Working',
   opening: 'Opening…',
+  odd: 'This part of the clip can’t be shown.',
   stages: {drawing: 'Drawing the sample', analyzing: 'Analyzing', solving: 'Stabilizing', choosing: 'Choosing', looking: 'Looking for cuts', rendering: 'Rendering', cropping: 'Framing'},
   states: {closed: 'Not open', opening: 'Opening…', open: 'Not stabilized', working: 'Working…', ready: 'Ready', failed: 'Trouble'},
   curves: {x: 'Across', y: 'Down', angle: 'Turn', zoom: 'Closeness', window: 'Window', black: 'Empty'},

@@ -1,5 +1,6 @@
 #include "studio/server/clip.h"
 
+#include <algorithm>
 #include <filesystem>
 #include <stdexcept>
 #include <system_error>
@@ -7,25 +8,37 @@
 
 #include "host/stabilize/control_items.h"
 #include "platform/hx/hx_controls.h"
+#include "studio/wire/roots.h"
+#include "studio/wire/told.h"
 
 namespace calmframe::studio {
 namespace {
 
 constexpr std::size_t kMostSteps = 200;
-// Each step keeps them.
-constexpr std::size_t kMostDeleted = 20000;
+constexpr std::size_t kLongestEnd = 1000;
+// A frame may be far from where a decoder can begin. One that stands still holds no window up
+// longer than this: a browser has six connections to a page's server, and waits with all of them.
+constexpr std::chrono::seconds kUntilSilent(15);
+constexpr char kSilent[] = "the clip's worker gives no answer";
+// Above what a worker counts, so that its numbers differ from those of the one before.
+constexpr std::uint64_t kCountsOfAWorker = std::uint64_t{1} << 32;
 
 std::string EndText(int code, const std::string& said) {
   if (code > 128) {
     return "the clip brought its worker down (signal " + std::to_string(code - 128) +
            "); it may be damaged. Your settings are kept; open it to try again";
   }
-  return "the clip's worker ended" + (said.empty() ? std::string() : ": " + said);
+  return "the clip's worker ended" +
+         (said.empty() ? std::string() : ": " + said.substr(0, kLongestEnd));
 }
 
-void ExpectText(const nlohmann::json& object, const char* name) {
-  const auto text = object.find(name);
-  if (text != object.end() && !text->is_string()) throw BadMessage("a text is none");
+// What is kept may be older.
+nlohmann::json OutcomeKept(const nlohmann::json& kept) {
+  try {
+    return ToldOf({{"outcome", kept.value("outcome", nlohmann::json())}})["outcome"];
+  } catch (const BadMessage&) {
+    return nullptr;
+  }
 }
 
 }  // namespace
@@ -37,7 +50,8 @@ Clip::Clip(const ClipSurroundings& surroundings, std::string id, std::string pat
       path_(std::move(path)),
       project_(std::move(project)),
       keep_(std::move(keep)),
-      has_settings_(project_.empty()) {
+      has_settings_(project_.empty()),
+      patience_(surroundings.context) {
   state_["state"] = "closed";
 }
 
@@ -48,7 +62,7 @@ Clip::Clip(const ClipSurroundings& surroundings, const nlohmann::json& kept, std
     settings_ = SettingsOf(kept["settings"]);
     has_settings_ = true;
   }
-  state_["outcome"] = kept.value("outcome", nlohmann::json());
+  state_["outcome"] = OutcomeKept(kept);
 }
 
 // Whoever still waits for an answer may be gone, too.
@@ -63,7 +77,7 @@ void Clip::Open() {
   try {
     worker_ = WorkerProcess::Start(
         surroundings_.context, surroundings_.ending, surroundings_.worker_words,
-        {[this](Message message) { Take(std::move(message)); },
+        {[this](const Message& message) { Take(message); },
          [this](int code, const std::string& said) { End(code, said); }});
   } catch (const std::system_error& error) {
     state_["state"] = "failed";
@@ -71,7 +85,7 @@ void Clip::Open() {
     surroundings_.changed(id_, ClipSurroundings::When::now);
     return;
   }
-  workers_ += std::uint64_t{1} << 20;
+  workers_ += kCountsOfAWorker;
   std::error_code ignored;
   const bool was_kept = std::filesystem::exists(keep_, ignored);
   nlohmann::json head = {{"op", "open"},
@@ -88,41 +102,52 @@ void Clip::Open() {
 void Clip::CloseWorker() {
   if (worker_) worker_->Close();
   worker_.reset();
-  for (auto waiting = std::move(waiting_); auto& [number, reply] : waiting) {
-    reply({{{"error", "the clip was closed"}}, {}});
-  }
-  waiting_.clear();
+  AnswerAll("the clip was closed");
 }
 
-// What a clip has made of its worker is not known: what the studio itself goes by is of its kind.
-void Clip::Take(Message message) {
-  for (const char* name : {"error", "why"}) ExpectText(message.head, name);
-  if (message.head.contains("tells")) {
-    if (!message.head["tells"].is_object()) throw BadMessage("what is told is no object");
-    for (const char* name : {"state", "error"}) ExpectText(message.head["tells"], name);
-    for (auto& [key, value] : message.head["tells"].items()) {
-      if (key == "settings") {
-        settings_ = SettingsOf(value);
-        has_settings_ = true;
-      } else if (key == "path") {
-        path_ = value.get<std::string>();
-      } else if ((key == "panel" || key == "picture" || key == "curves") &&
-                 value.is_number_unsigned()) {
-        state_[key] = workers_ + value.get<std::uint64_t>();
-      } else {
-        state_[key] = std::move(value);
-      }
-    }
-    surroundings_.changed(id_, ClipSurroundings::When::now);
-    return;
+// Whoever hears may ask again.
+void Clip::AnswerAll(const std::string& error) {
+  silent_ = 0;
+  for (auto waiting = std::exchange(waiting_, {}); auto& [number, one] : waiting) {
+    if (one.reply) one.reply({{{"error", error}}, {}});
+  }
+}
+
+void Clip::Take(const Message& message) {
+  if (const auto tells = message.head.find("tells"); tells != message.head.end()) {
+    return TakeTold(ToldOf(*tells));
   }
   const auto id = message.head.find("id");
   if (id == message.head.end() || !id->is_number_unsigned()) throw BadMessage("an answer to none");
-  const auto waiting = waiting_.find(id->get<std::uint64_t>());
-  if (waiting == waiting_.end()) return;
-  const Reply reply = std::move(waiting->second);
-  waiting_.erase(waiting);
-  reply(message);
+  const auto found = waiting_.find(id->get<std::uint64_t>());
+  if (found == waiting_.end()) return;
+  const Message answer = AnswerOf(found->second.op, found->second.width, message);
+  const Reply reply = std::move(found->second.reply);
+  waiting_.erase(found);
+  if (!reply) {
+    --silent_;  // late
+  } else {
+    reply(answer);
+  }
+}
+
+void Clip::TakeTold(nlohmann::json told) {
+  for (auto& [key, value] : told.items()) {
+    if (key == "settings") {
+      settings_ = SettingsOf(value);
+      has_settings_ = true;
+    } else if (key == "path") {
+      // Of saved work alone it isn't known; another clip's it can't become.
+      if (path_.empty()) {
+        path_ = Roots(surroundings_.roots).ExistingClip(value.get<std::string>());
+      }
+    } else if (key == "panel" || key == "picture" || key == "curves") {
+      state_[key] = workers_ + value.get<std::uint64_t>();
+    } else {
+      state_[key] = std::move(value);
+    }
+  }
+  surroundings_.changed(id_, ClipSurroundings::When::now);
 }
 
 void Clip::End(int code, const std::string& said) {
@@ -130,10 +155,7 @@ void Clip::End(int code, const std::string& said) {
   state_["state"] = "failed";
   state_["progress"] = nullptr;
   state_["error"] = EndText(code, said);
-  for (auto waiting = std::move(waiting_); auto& [number, reply] : waiting) {
-    reply({{{"error", state_["error"]}}, {}});
-  }
-  waiting_.clear();
+  AnswerAll(error());
   surroundings_.changed(id_, ClipSurroundings::When::now);
 }
 
@@ -210,7 +232,7 @@ void Clip::TakeWay(std::size_t number) {
 void Clip::DeleteTracks(const nlohmann::json& tracks) {
   Settings settings = ByHand();
   settings.deleted.merge(SettingsOf({{"deleted", tracks}}).deleted);
-  if (settings.deleted.size() > kMostDeleted) {
+  if (settings.deleted.size() > kMostDeletedTracks) {
     throw std::invalid_argument("more tracks than can be deleted one by one");
   }
   Change(std::move(settings), "");
@@ -266,14 +288,46 @@ void Clip::Give(Settings settings) {
 std::uint64_t Clip::Ask(nlohmann::json head, Reply reply) {
   Open();
   const std::uint64_t number = ++asked_;
-  if (!worker_) {
-    reply({{{"error", state_["error"]}}, {}});
+  const std::string op = head.value("op", "");
+  const bool may_last = op == "save";  // until it is solved
+  if (!worker_ || (silent_ > 0 && !may_last)) {
+    reply({{{"why", worker_ ? "busy" : "gone"}, {"error", worker_ ? kSilent : error()}}, {}});
     return number;
   }
-  waiting_[number] = std::move(reply);
+  using Clock = std::chrono::steady_clock;
+  waiting_[number] = {op, head.value("width", 0), std::move(reply),
+                      may_last ? Clock::time_point::max() : Clock::now() + kUntilSilent};
   head["id"] = number;
   worker_->Send({std::move(head), {}});
+  if (!may_last) LosePatience();
   return number;
+}
+
+void Clip::LosePatience() {
+  if (is_patient_) return;
+  const auto now = std::chrono::steady_clock::now();
+  auto next = std::chrono::steady_clock::time_point::max();
+  std::vector<Reply> late;
+  for (auto& [number, one] : waiting_) {
+    if (!one.reply) continue;
+    if (one.until > now) {
+      next = std::min(next, one.until);
+      continue;
+    }
+    // Its answer is still waited for: from then on others are asked for again.
+    late.push_back(std::exchange(one.reply, nullptr));
+    ++silent_;
+  }
+  if (next != std::chrono::steady_clock::time_point::max()) {
+    is_patient_ = true;
+    patience_.expires_at(next);
+    patience_.async_wait([this, here = std::weak_ptr(here_)](const boost::system::error_code&) {
+      if (here.expired()) return;
+      is_patient_ = false;
+      LosePatience();
+    });
+  }
+  for (const Reply& reply : late) reply({{{"why", "busy"}, {"error", kSilent}}, {}});
 }
 
 void Clip::Forget(std::uint64_t number) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <boost/asio/steady_timer.hpp>
 #include <chrono>
 #include <cstdint>
 #include <functional>
@@ -45,8 +46,11 @@ class Clip {
   const std::string& path() const { return path_.empty() ? project_ : path_; }
   const std::string& keep() const { return keep_; }
   const Settings& settings() const { return settings_; }
-  bool is_analysed() const { return state_.value("state", "") == "ready"; }
   bool is_open() const { return worker_ != nullptr; }
+  bool works() const { return state_.value("state", "") == "working"; }
+  // Its worker is gone, and not by the studio.
+  bool has_failed() const { return !worker_ && state_.value("state", "") == "failed"; }
+  std::string error() const { return state_.value("error", ""); }
 
   // Starts its worker unless one runs.
   void Open();
@@ -59,14 +63,15 @@ class Clip {
   void SetWindow(const std::string& name, const nlohmann::json& value);
   // Another one of the ways that were tried. Throws std::invalid_argument where there is none.
   void TakeWay(std::size_t number);
-  // Beside those that are; in all no more than kMostDeleted. Throws std::invalid_argument.
+  // Beside those that are; in all no more than kMostDeletedTracks. Throws std::invalid_argument.
   void DeleteTracks(const nlohmann::json& tracks);
   void RestoreTracks();
   void Undo();
   void Redo();
 
-  // To the worker, which is opened for it. `head`: see RunWorker. The answer always comes; of a
-  // worker that ends it has an "error". Gives the number by which it may be forgotten.
+  // To the worker, which is opened for it. `head`: see RunWorker. The answer always comes, but for
+  // a save within seconds; of a worker that ends, or gives none, it has an "error". Gives the
+  // number by which it may be forgotten.
   std::uint64_t Ask(nlohmann::json head, Reply reply);
   void Forget(std::uint64_t number);
   void Tell(nlohmann::json head);
@@ -77,7 +82,19 @@ class Clip {
   nlohmann::json Kept() const;
 
  private:
-  void Take(Message message);
+  struct Waiting {
+    std::string op;
+    int width = 0;  // of the picture that was asked for
+    Reply reply;    // none: it has had an answer, since the worker's came too late
+    std::chrono::steady_clock::time_point until;
+  };
+
+  // Throw BadMessage, PathRefused, std::invalid_argument for what makes no sense.
+  void Take(const Message& message);
+  void TakeTold(nlohmann::json told);
+  void AnswerAll(const std::string& error);
+  // Answers those that have waited too long, and looks again when others will have.
+  void LosePatience();
   void End(int code, const std::string& said);
   // `what`: changes of one thing in quick succession are one step.
   void Change(Settings settings, const std::string& what);
@@ -99,7 +116,11 @@ class Clip {
   std::chrono::steady_clock::time_point changed_at_;
   nlohmann::json state_ = nlohmann::json::object();
   std::shared_ptr<WorkerProcess> worker_;
-  std::map<std::uint64_t, Reply> waiting_;
+  std::map<std::uint64_t, Waiting> waiting_;
+  std::size_t silent_ = 0;  // of these those without a reply
+  boost::asio::steady_timer patience_;
+  bool is_patient_ = false;                                          // it runs
+  const std::shared_ptr<bool> here_ = std::make_shared<bool>(true);  // as long as this
   std::uint64_t asked_ = 0;
   std::uint64_t version_ = 1;  // of the settings, as the worker knows them
   std::uint64_t workers_ = 0;  // its numbers grow from worker to worker

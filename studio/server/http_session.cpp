@@ -12,7 +12,7 @@
 #include <string_view>
 #include <utility>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 #include "studio/server/page_files.h"
 #include "studio/server/trust.h"
 
@@ -29,8 +29,9 @@ constexpr std::size_t kMostBody = 256 << 10;
 constexpr std::chrono::seconds kPatience(20);
 constexpr int kMostConnections = 256;
 constexpr int kMostStreams = 32;
-constexpr int kMostGuesses = 4;                             // wrong passwords a second
-constexpr std::size_t kMostPending = std::size_t{8} << 20;  // bytes of events that a window lags
+constexpr int kMostGuesses = 4;  // wrong passwords a second
+constexpr std::size_t kMostPending = std::size_t{8}
+                                     << 20;  // bytes of events behind the one on its way
 
 constexpr char kPolicy[] =
     "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self' blob:; "
@@ -179,7 +180,8 @@ class Session : public std::enable_shared_from_this<Session> {
     if (Header(http::field::content_type).substr(0, 16) != "application/json") {
       return Fail(http::status::unsupported_media_type, "JSON is wanted");
     }
-    if (NestsTooDeep(body)) return Fail(http::status::bad_request, "it is nested too deep");
+    if (ExceedsBounds(body))
+      return Fail(http::status::bad_request, "it is nested too deep, or has too many parts");
     const nlohmann::json asked = nlohmann::json::parse(body, nullptr, false);
     if (!asked.is_object()) return Fail(http::status::bad_request, "an object is wanted");
     stream_.expires_never();  // a save waits for a solve
@@ -296,8 +298,9 @@ class Session : public std::enable_shared_from_this<Session> {
   }
 
   void Push(std::shared_ptr<const std::string> text) {
-    pending_ += text->size();
-    if (pending_ > kMostPending) return Close();  // it doesn't read
+    // It doesn't read; one event by itself may be larger than all that.
+    if (!events_.empty() && pending_ > kMostPending) return Close();
+    if (!events_.empty()) pending_ += text->size();
     events_.push_back(std::move(text));
     if (events_.size() == 1) PushNext();
   }
@@ -306,9 +309,10 @@ class Session : public std::enable_shared_from_this<Session> {
     boost::asio::async_write(stream_.socket(), boost::asio::buffer(*events_.front()),
                              [self = shared_from_this()](const error_code& error, std::size_t) {
                                if (error) return self->Close();
-                               self->pending_ -= self->events_.front()->size();
                                self->events_.pop_front();
-                               if (!self->events_.empty()) self->PushNext();
+                               if (self->events_.empty()) return;
+                               self->pending_ -= self->events_.front()->size();
+                               self->PushNext();
                              });
   }
 
@@ -376,7 +380,7 @@ class Session : public std::enable_shared_from_this<Session> {
   std::shared_ptr<Session> held_;
   std::optional<std::uint64_t> listener_;
   std::deque<std::shared_ptr<const std::string>> events_;
-  std::size_t pending_ = 0;
+  std::size_t pending_ = 0;  // bytes of all but the first
 };
 
 }  // namespace

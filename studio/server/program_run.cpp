@@ -6,7 +6,7 @@
 #include <optional>
 #include <utility>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 #include "host/batch/child.h"
 
 namespace calmframe::studio {
@@ -14,17 +14,18 @@ namespace calmframe::studio {
 // What is posted finds it, or nobody.
 struct ProgramRun::Listener {
   Events events;
-  std::string error;  // that it told last
+  std::string error;  // that it told last, cut
 
   void Hear(const std::string& line) {
     const nlohmann::json told =
-        NestsTooDeep(line) ? nlohmann::json() : nlohmann::json::parse(line, nullptr, false);
+        ExceedsBounds(line) ? nlohmann::json() : nlohmann::json::parse(line, nullptr, false);
+    constexpr std::size_t kLongest = 2000;
     if (!told.is_object()) {
-      error = line;
+      error = line.substr(0, kLongest);
       return;
     }
     try {
-      error = told.value("error", error);
+      error = told.value("error", error).substr(0, kLongest);
       events.told(told);
     } catch (const nlohmann::json::exception&) {  // of another shape
     }
@@ -46,12 +47,16 @@ ProgramRun::ProgramRun(boost::asio::io_context& context, std::vector<std::string
                        Events events)
     : listener_(std::make_shared<Listener>(Listener{std::move(events), {}})) {
   const std::weak_ptr<Listener> weak = listener_;
-  const auto post = [&context, weak](auto act) {
-    boost::asio::post(context, [weak, act] {
+  // Lines on their way: a run that talks faster than it is heard waits.
+  const auto unheard = std::make_shared<std::atomic<int>>(0);
+  const auto post = [&context, weak, unheard](auto act) {
+    ++*unheard;
+    boost::asio::post(context, [weak, act, unheard] {
+      --*unheard;
       if (const std::shared_ptr<Listener> listener = weak.lock()) act(*listener);
     });
   };
-  thread_ = std::thread([post, words = std::move(words), stops = stops_] {
+  thread_ = std::thread([post, unheard, words = std::move(words), stops = stops_] {
     int code = 127;
     try {
       batch::Child child(words);
@@ -69,6 +74,10 @@ ProgramRun::ProgramRun(boost::asio::io_context& context, std::vector<std::string
         if (said == batch::Child::Said::end) break;
         if (said == batch::Child::Said::line) {
           post([line](Listener& listener) { listener.Hear(line); });
+        }
+        constexpr int kMostUnheard = 100;
+        while (*unheard > kMostUnheard && !*stops) {
+          std::this_thread::sleep_for(std::chrono::milliseconds(5));
         }
       }
       child.Kill();  // see WorkerProcess::Start

@@ -11,7 +11,7 @@ namespace calmframe::studio {
 namespace {
 
 constexpr std::size_t kMostJobs = 200;
-constexpr std::size_t kMostNotes = 50;  // of a job
+constexpr std::size_t kMostNotes = 50, kLongestNote = 2000;  // of a job
 
 std::string Number(double value) {
   return nlohmann::json(value).dump();
@@ -170,7 +170,7 @@ void RenderQueue::Heard(std::uint64_t number, const nlohmann::json& told) {
   Job* const job = Find(number);
   if (!job) return;
   if (told.contains("warning") && job->notes.size() < kMostNotes) {
-    job->notes.push_back(told["warning"].get<std::string>());
+    job->notes.push_back(told["warning"].get<std::string>().substr(0, kLongestNote));
   }
   if (told.value("stage", "") == "rendering") {
     job->share = std::clamp(told.value("share", 0.0), 0.0, 1.0);

@@ -132,7 +132,7 @@ void Studio::StopAll() {
 }
 
 void Studio::Restore() {
-  const auto kept = batch::ReadObject(folder_ + kSession);
+  const auto kept = batch::ReadObject(folder_ + kSession, batch::kMostOfAll);
   if (!kept) return;
   try {
     secret_ = kept->value("secret", "");
@@ -186,7 +186,7 @@ void Studio::Open(Clip& clip) {
   std::size_t open = 0;
   for (auto id = used_.begin(); id != used_.end();) {
     Clip* const one = Find(*id);
-    const bool rests = one && one->State().value("state", "") != "working" && !renders_->Needs(*id);
+    const bool rests = one && !one->works() && !renders_->Needs(*id);
     if (one && one->is_open() && ++open > kMostOpen && rests) {
       one->CloseWorker();
       id = used_.erase(id);
@@ -362,6 +362,11 @@ std::optional<std::uint64_t> Studio::Ask(const std::string& id, nlohmann::json h
                                          Clip::Reply reply) {
   Clip* const clip = Find(id);
   if (!clip) return {};
+  // A page that shows it would have it die again and again.
+  if (clip->has_failed()) {
+    reply({{{"why", "gone"}, {"error", clip->error()}}, {}});
+    return 0;
+  }
   Open(*clip);
   return clip->Ask(std::move(head), std::move(reply));
 }
@@ -395,17 +400,19 @@ void Studio::Changed(const std::string& id, ClipSurroundings::When when) {
 
 // Many changes at once are one event; one by itself waits for none.
 void Studio::Flush(ClipSurroundings::When when) {
-  constexpr std::chrono::milliseconds kBetween(30);
-  auto at = std::chrono::steady_clock::now();
+  using Clock = std::chrono::steady_clock;
+  constexpr Clock::duration kBetween = std::chrono::milliseconds(30);
+  auto at = Clock::now();
   if (when == ClipSurroundings::When::soon) at += kBetween;
-  at = std::max(at, flushed_at_ + kBetween);
+  // What takes long leaves most of the thread's time to others.
+  at = std::max(at, flushed_at_ + std::max(kBetween, 4 * flush_took_));
   if (flushes_ && flush_.expiry() <= at) return;
   flushes_ = true;
   flush_.expires_at(at);  // of a later one nothing is heard any more
   flush_.async_wait([this](const boost::system::error_code& error) {
     if (error) return;
     flushes_ = false;
-    flushed_at_ = std::chrono::steady_clock::now();
+    const auto began = Clock::now();
     nlohmann::json event = nlohmann::json::object();
     for (const std::string& id : changed_) {
       if (const Clip* clip = Find(id)) event["clips"][id] = clip->State();
@@ -417,6 +424,8 @@ void Studio::Flush(ClipSurroundings::When when) {
     changed_.clear();
     order_changed_ = renders_changed_ = sample_changed_ = false;
     Send(event);
+    flushed_at_ = Clock::now();
+    flush_took_ = flushed_at_ - began;
   });
 }
 

@@ -62,7 +62,8 @@ class Studio {
   // What a page asks for: an object with "op". Answers with an object, at once or later, with
   // "error" in one line where it could not be.
   void Do(const nlohmann::json& request, const Answer& answer);
-  // To the clip's worker; see RunWorker. The number to forget it by; none: there is no such clip.
+  // To the clip's worker; see RunWorker. One that has ended by itself is not started for it. The
+  // number to forget it by; none: there is no such clip.
   std::optional<std::uint64_t> Ask(const std::string& clip, nlohmann::json head, Clip::Reply reply);
   void Forget(const std::string& clip, std::uint64_t number);
 
@@ -109,6 +110,7 @@ class Studio {
   boost::asio::steady_timer flush_, keep_;
   bool flushes_ = false, keeps_ = false;
   std::chrono::steady_clock::time_point flushed_at_;
+  std::chrono::steady_clock::duration flush_took_{};
   std::string trouble_;  // what can't be kept, and why
 };
 

@@ -18,9 +18,14 @@
 namespace calmframe::studio {
 
 using boost::system::error_code;
+using Clock = std::chrono::steady_clock;
 
 WorkerProcess::WorkerProcess(boost::asio::io_context& context, EndingThreads& ending, Events events)
-    : ending_(ending), socket_(context), events_(std::move(events)), part_(256 << 10) {}
+    : ending_(ending),
+      socket_(context),
+      events_(std::move(events)),
+      part_(256 << 10),
+      rest_(context) {}
 
 WorkerProcess::~WorkerProcess() {
   Close();
@@ -45,7 +50,6 @@ std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& con
     try {
       batch::Child child(words, theirs);
       close(std::exchange(theirs, -1));
-      using Clock = std::chrono::steady_clock;
       constexpr std::chrono::seconds kUntilKilled(4);
       std::optional<Clock::time_point> ends_since;
       std::string line;
@@ -79,7 +83,11 @@ std::shared_ptr<WorkerProcess> WorkerProcess::Start(boost::asio::io_context& con
 
 void WorkerProcess::Send(const Message& message) {
   if (closed_) return;
+  // Settings with all the tracks that may be deleted are some 300 kB.
+  constexpr std::size_t kMostWaiting = std::size_t{32} << 20;
   out_.push_back(Encode(message));
+  out_bytes_ += out_.back().size();
+  if (out_bytes_ > kMostWaiting) HangUp(Process::die);
   if (out_.size() == 1) Write();
 }
 
@@ -87,6 +95,7 @@ void WorkerProcess::Close() {
   closed_ = true;
   events_ = {};
   HangUp(Process::end);
+  rest_.cancel();
   // What is still to be written may hold this until the context goes, after all else.
   if (thread_.joinable()) ending_.threads.push_back(std::move(thread_));
 }
@@ -104,6 +113,7 @@ void WorkerProcess::Read() {
         const std::shared_ptr<WorkerProcess> self = weak.lock();
         if (!self || self->closed_) return;
         if (error) return self->HangUp(Process::end);  // its end is told by its process
+        const Clock::time_point began = Clock::now();
         try {
           self->reader_.Add(self->part_.data(), size);
           while (std::optional<Message> message = self->reader_.Next()) {
@@ -112,7 +122,15 @@ void WorkerProcess::Read() {
         } catch (const std::exception&) {  // no message, or one that makes no sense
           return self->HangUp(Process::die);
         }
-        self->Read();
+        // Whoever talks without end has a fifth of the thread's time.
+        constexpr std::chrono::milliseconds kShort(2);
+        const Clock::duration took = Clock::now() - began;
+        if (took < kShort) return self->Read();
+        self->rest_.expires_after(4 * took);
+        self->rest_.async_wait([weak](const error_code&) {
+          const std::shared_ptr<WorkerProcess> rested = weak.lock();
+          if (rested && !rested->closed_) rested->Read();
+        });
       });
 }
 
@@ -120,6 +138,7 @@ void WorkerProcess::Write() {
   boost::asio::async_write(socket_, boost::asio::buffer(out_.front()),
                            [self = shared_from_this()](const error_code& error, std::size_t) {
                              if (error) return;
+                             self->out_bytes_ -= self->out_.front().size();
                              self->out_.pop_front();
                              if (!self->out_.empty()) self->Write();
                            });

@@ -3,6 +3,7 @@
 #include <atomic>
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/local/stream_protocol.hpp>
+#include <boost/asio/steady_timer.hpp>
 #include <deque>
 #include <functional>
 #include <memory>
@@ -42,6 +43,7 @@ class WorkerProcess : public std::enable_shared_from_this<WorkerProcess> {
                                               Events events);
   ~WorkerProcess();
 
+  // One that takes nothing until too much waits is killed.
   void Send(const Message& message);
   // Nothing is heard of it any more; it ends by itself, or is made to.
   void Close();
@@ -59,7 +61,9 @@ class WorkerProcess : public std::enable_shared_from_this<WorkerProcess> {
   Events events_;
   MessageReader reader_;
   std::vector<char> part_;
+  boost::asio::steady_timer rest_;  // between what it says
   std::deque<std::string> out_;
+  std::size_t out_bytes_ = 0;
   bool closed_ = false;
   const std::shared_ptr<std::atomic<Process>> process_ =
       std::make_shared<std::atomic<Process>>(Process::live);

@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <string_view>
 
-#include "host/base/json_depth.h"
+#include "host/base/json_bounds.h"
 
 namespace calmframe::studio {
 namespace {
@@ -45,7 +45,8 @@ std::optional<Message> MessageReader::Next() {
   if (head > kMostHead || bytes > kMostBytes) throw BadMessage("a message is too large");
   if (left.size() < kPrefix + head + bytes) return {};
   const std::string_view object = left.substr(kPrefix, head);
-  if (NestsTooDeep(object)) throw BadMessage("a message is nested too deep");
+  if (ExceedsBounds(object))
+    throw BadMessage("a message is nested too deep, or has too many parts");
   Message message;
   message.head =
       nlohmann::json::parse(object.begin(), object.end(), nullptr, /*allow_exceptions=*/false);

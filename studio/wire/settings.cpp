@@ -39,6 +39,8 @@ auto Named(const Names& names, const nlohmann::json& json, const std::string& wh
   throw std::invalid_argument(what + ": there is no such choice");
 }
 
+constexpr std::size_t kMostControls = 500;
+
 double NumberOf(const nlohmann::json& json, const std::string& what, double least, double most) {
   const double number = json.is_number() ? json.get<double>() : std::nan("");
   if (!(number >= least && number <= most)) throw std::invalid_argument(what + ": out of range");
@@ -72,6 +74,7 @@ Settings SettingsOf(const nlohmann::json& json) {
   if (!controls.is_object() || !window.is_object()) {
     throw std::invalid_argument("controls and window are objects");
   }
+  if (controls.size() > kMostControls) throw std::invalid_argument("no effect has such controls");
   for (const auto& [key, value] : controls.items()) {
     std::int32_t id = 0;
     const auto [end, error] = std::from_chars(key.data(), key.data() + key.size(), id);
@@ -89,6 +92,9 @@ Settings SettingsOf(const nlohmann::json& json) {
   }
   const nlohmann::json deleted = json.value("deleted", nlohmann::json::array());
   if (!deleted.is_array()) throw std::invalid_argument("deleted tracks are a list");
+  if (deleted.size() > kMostDeletedTracks) {
+    throw std::invalid_argument("more tracks than can be deleted one by one");
+  }
   for (const nlohmann::json& point : deleted) {
     if (!point.is_array() || point.size() != 2) {
       throw std::invalid_argument("a track is a frame and a slot");

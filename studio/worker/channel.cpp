@@ -23,6 +23,12 @@ std::optional<Message> Channel::Receive() try {
 
 void Channel::Send(const Message& message) {
   const std::string text = Encode(message);
+  // Of a film that is longer than what is told of each of its frames.
+  if (text.size() - message.bytes.size() > MessageReader::kMostHead &&
+      message.head.contains("id")) {
+    return Send(
+        {{{"id", message.head["id"]}, {"error", "there is too much of it to be shown"}}, {}});
+  }
   const std::lock_guard lock(sending_);
   for (std::size_t sent = 0; sent < text.size();) {
     const ssize_t got = send(socket_, text.data() + sent, text.size() - sent, MSG_NOSIGNAL);

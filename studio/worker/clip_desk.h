@@ -39,8 +39,8 @@ struct OpenRequest {
 // "state": "opening", "open" (not analysed), "working", "ready", "failed"; "error"; "info";
 // "progress"; "panel" and "curves", numbers that grow when Panel() and Curves() change; "picture",
 // which grows when steady frames look different; "shows": the version of the settings that they
-// show;
-// "outcome", "shots", "choice", "warnings"; "settings", of saved work that was opened with its own.
+// show; "outcome", "shots" (of the first with "choice"), "warnings"; "settings", of saved work that
+// was opened with its own. See ToldOf, which tells what of them the studio hears.
 class ClipDesk {
  public:
   using Tell = std::function<void(nlohmann::json part)>;

@@ -124,11 +124,8 @@ void ClipDesk::TellShots() {
   std::vector<host::ShotOutcome> outcomes;
   const double rate = RateOf(film_->whole());
   for (const Shot& shot : shots_) {
-    list.push_back({{"first", shot.range.first},
-                    {"end", shot.range.end},
-                    {"solved", shot.solved},
-                    {"outcome", shot.outcome.Json()},
-                    {"choice", shot.choice}});
+    list.push_back({{"first", shot.range.first}, {"end", shot.range.end}});
+    if (list.size() == 1) list.front()["choice"] = shot.choice;  // a film has many
     curves.push_back(
         {{"first", shot.range.first}, {"end", shot.range.end}, {"curves", shot.curves}});
     if (!shot.solved) continue;
@@ -138,9 +135,7 @@ void ClipDesk::TellShots() {
   }
   nlohmann::json outcome = nullptr;
   if (!outcomes.empty()) {
-    const host::Outcome film = host::OutcomeOf(outcomes);
-    outcome = film.Json();
-    outcome["text"] = film.Text();
+    outcome = host::OutcomeOf(outcomes).Json();
   }
   {
     const std::lock_guard lock(mutex_);

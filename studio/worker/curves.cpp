@@ -38,24 +38,10 @@ nlohmann::json ListOf(const std::vector<double>& values) {
 }  // namespace
 
 nlohmann::json CurvesOf(const host::ShownPath& path) {
-  nlohmann::json window;
-  for (const char* name : {"x", "y", "least_x", "least_y", "most_x", "most_y"}) {
-    window[name] = nlohmann::json::array();
-  }
-  for (const host::WindowPlace& place : path.windows) {
-    window["x"].push_back(Rounded(place.centre.x));
-    window["y"].push_back(Rounded(place.centre.y));
-    window["least_x"].push_back(Rounded(place.least.x));
-    window["least_y"].push_back(Rounded(place.least.y));
-    window["most_x"].push_back(Rounded(place.most.x));
-    window["most_y"].push_back(Rounded(place.most.y));
-  }
   return {{"before", CameraOf(path.source)},
           {"after", CameraOf(path.output)},
-          {"window", std::move(window)},
           {"zooms", ListOf(path.output.zooms)},
-          {"black", ListOf(path.output.uncovered)},
-          {"most_zoom", Rounded(path.most_zoom)}};
+          {"black", ListOf(path.output.uncovered)}};
 }
 
 }  // namespace calmframe::studio

@@ -8,8 +8,7 @@ namespace calmframe::studio {
 
 // What a page plots of a shot, a number a frame (a field, where it is interlaced), null where there
 // is none: "before" and "after" with "x", "y" (pixels of the source), "angle" (degrees) and "zoom"
-// of the camera, summed up from the shot's first frame; "window" with "x", "y", and as far as they
-// may go "least_x" ... "most_y"; "zooms", "black" (0 to 1), and "most_zoom".
+// of the camera, summed up from the shot's first frame; "zooms", and "black" (0 to 1).
 nlohmann::json CurvesOf(const host::ShownPath& path);
 
 }  // namespace calmframe::studio

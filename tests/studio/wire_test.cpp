@@ -3,6 +3,7 @@
 #include "studio/wire/encoding.h"
 #include "studio/wire/message.h"
 #include "studio/wire/settings.h"
+#include "studio/wire/told.h"
 
 namespace calmframe::studio {
 namespace {
@@ -46,6 +47,60 @@ TEST(StudioWireTest, SettingsSurviveTheWayThereAndBack) {
   const nlohmann::json none = {{"controls", nlohmann::json::object()},
                                {"window", nlohmann::json::object()}};
   EXPECT_EQ(JsonOf(SettingsOf(nlohmann::json::object())), none);
+}
+
+// Each at its limit, and beyond: of a worker that a clip has taken over.
+TEST(StudioWireTest, HearsAsMuchAsAPageCanShow) {
+  const auto info = [](const char* name, const nlohmann::json& value) {
+    nlohmann::json told = nlohmann::json::parse(
+        R"({"width": 9, "height": 9, "shown_width": 9, "frames": 9, "rate": 25, "interlaced": false})");
+    told[name] = value;
+    return nlohmann::json{{"info", told}};
+  };
+  const auto settings = [](int controls, int deleted) {
+    nlohmann::json told = {{"controls", nlohmann::json::object()},
+                           {"deleted", nlohmann::json::array()}};
+    for (int i = 0; i < controls; ++i) told["controls"][std::to_string(i)] = 1.0;
+    for (int i = 0; i < deleted; ++i) told["deleted"].push_back({i, 0});
+    return nlohmann::json{{"settings", told}};
+  };
+  const auto progress = [](double share) {
+    return nlohmann::json{{"progress", {{"stage", "solving"}, {"says", ""}, {"share", share}}}};
+  };
+  const std::pair<nlohmann::json, nlohmann::json> table[] = {
+      {{{"picture", 4294967295}}, {{"picture", 4294967296}}},
+      {info("frames", 10000000), info("frames", 10000001)},
+      {info("width", 1), info("width", 0)},
+      {info("rate", 1e9), info("rate", 1.1e9)},
+      {info("rate", 1e-9), info("rate", -1e-9)},
+      {progress(1), progress(1.001)},
+      {settings(500, 20000), settings(501, 0)},
+      {settings(0, 20000), settings(0, 20001)}};
+  for (const auto& [held, beyond] : table) {
+    EXPECT_NO_THROW(ToldOf(held)) << held.dump().substr(0, 200);
+    EXPECT_ANY_THROW(ToldOf(beyond)) << beyond.dump().substr(0, 200);
+  }
+  const auto count = [](const char* key, std::size_t of) {
+    nlohmann::json list = nlohmann::json::array();
+    for (std::size_t i = 0; i < of; ++i) {
+      list.push_back(std::string(key) == "shots" ? nlohmann::json{{"first", i}, {"end", i}} : "w");
+    }
+    return ToldOf({{key, list}})[key].size();
+  };
+  EXPECT_EQ(count("shots", 10001), 10000u);
+  EXPECT_EQ(count("warnings", 101), 100u);
+
+  const auto picture = [](int width, int height) {
+    const auto byte = [](int number) { return static_cast<char>(number); };
+    return std::string("\xff\xd8\xff\xdb\0\3\0\xff\xc0\0\21\10", 12) + byte(height >> 8) +
+           byte(height) + byte(width >> 8) + byte(width) + '\3';
+  };
+  const auto heard = [](const std::string& bytes) {
+    return AnswerOf("frame", 640, {{{"why", ""}}, bytes}).bytes;
+  };
+  EXPECT_EQ(heard(picture(640, 16384)), picture(640, 16384));
+  EXPECT_EQ(heard(picture(640, 16385)), "");
+  EXPECT_THROW(heard(picture(641, 9)), BadMessage);
 }
 
 TEST(StudioWireTest, RefusesWhatNoEncoderCanBeToldOrWouldWriteElsewhere) {

@@ -213,6 +213,17 @@ TEST_F(BatchPlanTest, WhatIsDoneIsDoneUntilAnythingChanges) {
     ASSERT_TRUE(WriteWhole(path, nested));
     EXPECT_EQ(ReadRecord(path).has_value(), depth < 99) << depth;
   }
+  for (const int members : {1000, 1001, 200000}) {
+    std::string many = "{";
+    for (int m = 0; m < members; ++m) many += '"' + std::to_string(m) + "\":0,";
+    many.back() = '}';
+    ASSERT_TRUE(WriteWhole(path, many + "\n"));
+    EXPECT_EQ(ReadObject(path).has_value(), members < 1001) << members;
+  }
+  for (const std::size_t more : {std::size_t{0}, std::size_t{1}}) {
+    ASSERT_TRUE(WriteWhole(path, text + std::string((16 << 20) - text.size() + more, ' ')));
+    EXPECT_EQ(ReadRecord(path).has_value(), more == 0);
+  }
   SaveRecord(plan, whole);
   std::filesystem::remove(plan.OutputOf(task));
   EXPECT_FALSE(DoneRecord(plan, task));

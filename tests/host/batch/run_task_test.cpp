@@ -77,12 +77,15 @@ TEST_F(RunTaskTest, AClipIsDoneOnceAndAgainWhenItChanges) {
   Does(R"(echo '{"stage":"rendering","share":0.5}'
 echo no json; echo '[1]'; echo '{"stage":7}'
 echo "{\"warning\":\"$2: dark\"}" >&2; echo "{\"warning\":\"$2: dark\"}" >&2
+for n in $(seq 300); do printf '{"warning":"%03d%05000d"}\n' $n 0; done
 echo '{"width_kept":0.9,"most_zoom":1.1}')");
   Silent watcher;
   const TaskResult first = RunTask(plan, task, 1, watcher);
   EXPECT_EQ(first.state, State::done) << first.record.error;
   EXPECT_EQ(watcher.last, 0.75);
-  EXPECT_THAT(first.record.warnings, ElementsAre(task.clip + ": dark"));
+  ASSERT_EQ(first.record.warnings.size(), 200u);
+  EXPECT_EQ(first.record.warnings[0], task.clip + ": dark");
+  EXPECT_EQ(first.record.warnings[199], "199" + std::string(3997, '0'));
   EXPECT_EQ(first.record.outcome.value("most_zoom", 0.0), 1.1);
   EXPECT_EQ(Content("out/x-s.mp4"), "x.mp4\nsteady\n");
   EXPECT_THAT(Outputs(), ElementsAre("x-s.mp4"));

@@ -116,6 +116,11 @@ TEST_F(ClipTest, VariableRateAndOtherStreamsGoThroughUntouched) {
   }
   const std::string bytes = Content("out.mp4");
   EXPECT_LT(bytes.find("moov"), bytes.find("mdat"));
+  // Without its sound it isn't written.
+  std::filesystem::remove(In("in.mp4"));
+  const auto silent = [&] { ClipWriter::Create(In("silent.mp4"), info, 64, 48, {}); };
+  EXPECT_THAT(silent, Fails(Failure::Side::input, HasSubstr("in.mp4: No such file")));
+  EXPECT_FALSE(std::filesystem::exists(In("silent.mp4")));
 }
 
 double StartOf(const std::string& path) {

@@ -393,6 +393,13 @@ TEST_F(SolvedClipTest, ForeignAndDamagedInstances) {
     EXPECT_THROW(ReadSolvedClip(Cut(raw, raw.size() + 7)), NoSolvedClip);
   }
   EXPECT_THROW(ReadSolvedClip({}), NoSolvedClip);
+  host().SaveAs(PayloadForm::packed);
+  Bytes packed = Saved(*played.effect).instance;
+  EXPECT_EQ(packed[5], HX_PAYLOAD_PACKED);
+  EXPECT_EQ(GivenFrames::Of(ReadSolvedClip(packed)).vertices,
+            GivenFrames::Of(played.clip).vertices);
+  packed[51] = 0x7f;  // more slots than a row has bytes for
+  EXPECT_THROW(ReadSolvedClip(packed), NoSolvedClip);
   EXPECT_THROW(WithWindows(raw, Windows(3)), std::invalid_argument);
   EXPECT_THROW(WithWindows(raw, Windows(16, {0, 0, 0, 0})), std::invalid_argument);
   EXPECT_THROW(ShiftWithoutCrop(played.clip), std::invalid_argument);
