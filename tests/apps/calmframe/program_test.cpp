@@ -155,14 +155,14 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
     std::string flags, what;
     double most_zoom;
   };
-  for (const Run& run : {Run{"", "by itself", 1.5}, Run{"--zoom-at-most 1.15", "limited", 1.15},
-                         Run{"--smoothness 80 --window follow", "asked for", 1.5},
-                         Run{"--smoothness 20", "where the effect's own leaves black", 1.5},
-                         Run{"--smoothness 80 --zoom-speed 0", "zoomed once for all", 1.5},
-                         Run{"--as-set --zoom-at-most 1.05", "limited, as set", 1.05},
-                         Run{"--framing synthesize-edges --zoom-at-most 1.2", "filled", 1.2},
-                         Run{"--framing synthesize-edges --zoom-at-most 1.05",
-                             "no room for a feather", 1.05}}) {
+  for (const Run& run :
+       {Run{"", "by itself", 1.5}, Run{"--zoom-at-most 1.15", "limited", 1.15},
+        Run{"--smoothness 80 --window follow", "asked for", 1.5},
+        Run{"--smoothness 20", "where the effect's own leaves black", 1.5},
+        Run{"--smoothness 80 --zoom-speed 0", "zoomed once for all", 1.5},
+        Run{"--as-set --zoom-at-most 1.05", "limited, as set", 1.05},
+        Run{"--framing synthesize-edges --zoom-at-most 1.2", "filled", 1.2},
+        Run{"--framing synthesize-edges --zoom-at-most 1.05", "no room for a feather", 1.05}}) {
     const std::string told =
         RunWell("stabilize in.mkv out.mkv --codec ffv1 --overwrite " + run.flags);
     const std::size_t at = told.find("zoom ");
