@@ -30,7 +30,7 @@ namespace fs = std::filesystem;
 using Clock = std::chrono::steady_clock;
 
 // Of what a program says of its clip, which may have taken it over.
-constexpr std::size_t kMostWarnings = 200, kLongestLine = 4000;
+constexpr std::size_t kMostWarnings = 200, kLongestSaid = 4000;
 
 // Why a task can't go on; one line.
 struct Failed {
@@ -268,7 +268,7 @@ class Run {
 
   // A line in the words of whoever asked for the clip.
   std::string Own(std::string line) const {
-    line.resize(std::min(line.size(), kLongestLine));
+    line.resize(std::min(line.size(), kLongestSaid));
     ReplaceAll(line, task_.source, task_.clip);
     ReplaceAll(line, written_, task_.output);
     ReplaceAll(line, plan_.folder + "/", "");
