@@ -16,6 +16,7 @@
 #include "apps/calmframe/thumbnails.h"
 #include "host/effects/renderer.h"
 #include "host/stabilize/drawing.h"
+#include "host/stabilize/failures.h"
 #include "host/timeline/layer.h"
 
 namespace calmframe {
@@ -154,7 +155,14 @@ std::vector<std::string> RenderFrames(
     if (InterruptAsked()) throw Interrupted();
     shown.done = static_cast<double>(frame - range.first);
     progress.Show(shown);
-    const DrawnFrame made = frames.Take(static_cast<std::int64_t>(frame));
+    const DrawnFrame made = [&] {
+      try {
+        return frames.Take(static_cast<std::int64_t>(frame));
+      } catch (const host::SolveFailure&) {
+        clip.CheckMedia();  // of a frame that could not be read it isn't the plug-in's
+        throw;
+      }
+    }();
     if (!made.banner.empty()) ++banners[made.banner];
     take(frame, made);
   }

@@ -61,8 +61,7 @@ Whole WholeIn(const nlohmann::json& request, const char* name, Whole most) {
 }  // namespace
 
 Studio::Studio(boost::asio::io_context& context, const StudioSettings& settings)
-    : context_(context),
-      roots_(settings.roots),
+    : roots_(settings.roots),
       readable_(ReadableFolders(settings)),
       folder_(settings.folder),
       work_folder_(settings.WorkFolder()),

@@ -91,7 +91,6 @@ class Studio {
   void KeepSoon();
   std::string KeepPath(const std::string& id) const { return work_folder_ + "/" + id + ".calm"; }
 
-  boost::asio::io_context& context_;
   const Roots roots_;
   const Roots readable_;  // these and the sample's folder, which pages don't browse
   const std::string folder_, work_folder_;
