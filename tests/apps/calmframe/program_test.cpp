@@ -645,6 +645,14 @@ TEST_F(ProgramTest, APictureIsTheSameThroughAProjectOrWithout) {
   EXPECT_TRUE(drawn("--project p.calm" + same) == fresh);
   RunWell("analyze in.mp4 --project p.calm --quiet --framing stabilize-only");
   EXPECT_TRUE(drawn("--project p.calm" + same) == fresh);
+  // Of frames that the analysis has decoded, or of such as are decoded anew.
+  int number = 0;
+  for (const std::string& flags :
+       {std::string(" --from 12f --to 31f"), std::string(" --framing synthesize-edges --to 14f")}) {
+    const std::string work = " --project q" + std::to_string(++number) + ".calm";
+    RunWell("analyze in.mp4 --quiet" + work + flags);
+    EXPECT_TRUE(drawn(work + flags) == drawn(flags)) << flags;
+  }
 }
 
 // The next run of saved work doesn't decode the clip to number its frames, but says the same of it.
