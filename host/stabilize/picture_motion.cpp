@@ -9,6 +9,7 @@
 
 #include "host/stabilize/homography.h"
 #include "host/stabilize/median.h"
+#include "host/stabilize/path_correction.h"
 #include "host/stabilize/track_paths.h"
 #include "host/stabilize/window/clip_windows.h"
 #include "platform/tessel/threads.h"
@@ -92,6 +93,7 @@ PictureMotion FindMotion(const WarpedPlane& plane) {
   PictureMotion motion{std::vector<Similarity>(frames), std::vector<double>(frames, 0)};
   // A stretch of frames after the other, so that no more than its rows are there at a time.
   constexpr std::size_t kStretch = 256;
+  PathGatherer paths(clip.slots);
   TrackRow last;
   Cells before_last_cells, last_cells;
   for (std::size_t first = 0; first < frames; first += kStretch) {
@@ -118,8 +120,10 @@ PictureMotion FindMotion(const WarpedPlane& plane) {
       }
       before_last_cells = std::exchange(last_cells, cells[i]);
     }
+    for (const TrackRow& row : rows) paths.Add(row);
     last = std::move(rows.back());
   }
+  CorrectByPaths(paths.Take(), kTrackTolerance * clip.width, motion.background);
   return motion;
 }
 

@@ -176,16 +176,23 @@ Similarity FitMotion(const std::vector<Point>& from, const std::vector<Point>& t
     const double share = std::clamp(reached / judges, 0.001, 0.999);
     pairs = std::min<double>(kMostPairs, kMissed / std::log(1 - share * share));
   }
+  return RefitMotion(best, from, to, std::vector<double>(from.size(), 1.0), tolerance);
+}
+
+Similarity RefitMotion(Similarity motion, const std::vector<Point>& from,
+                       const std::vector<Point>& to, const std::vector<double>& shares,
+                       double tolerance) {
   constexpr int kRounds = 8;
+  const double square = tolerance * tolerance;
   std::vector<double> weights(from.size());
   for (int round = 0; round < kRounds; ++round) {
     for (std::size_t i = 0; i < from.size(); ++i) {
-      const double rest = std::max(0.0, 1 - SquaredMiss(best, from[i], to[i]) / (2.25 * square));
-      weights[i] = rest * rest;
+      const double rest = std::max(0.0, 1 - SquaredMiss(motion, from[i], to[i]) / (2.25 * square));
+      weights[i] = shares[i] * rest * rest;
     }
-    best = Fit(from, to, weights);
+    motion = Fit(from, to, weights);
   }
-  return best;
+  return motion;
 }
 
 }  // namespace calmframe::host

@@ -38,5 +38,10 @@ constexpr double kTrackTolerance = 0.003;
 // identity, where there are fewer than three. All must be numbers.
 Similarity FitMotion(const std::vector<Point>& from, const std::vector<Point>& to,
                      double tolerance);
+// Its last steps: `motion` bettered by Tukey's bisquare, each point with its share, at least 0. A
+// point that is 1.5 `tolerance` from where the motion takes it doesn't count.
+Similarity RefitMotion(Similarity motion, const std::vector<Point>& from,
+                       const std::vector<Point>& to, const std::vector<double>& shares,
+                       double tolerance);
 
 }  // namespace calmframe::host
