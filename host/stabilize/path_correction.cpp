@@ -10,8 +10,8 @@
 namespace calmframe::host {
 namespace {
 
-constexpr std::size_t kParabola = 24;    // frames of a parabola, to either side of its middle
-constexpr std::size_t kShortest = 18;    // frames of a path that has one
+constexpr std::size_t kParabola = 18;    // frames of a parabola, to either side of its middle
+constexpr std::size_t kShortest = 12;    // frames of a path that has one
 constexpr std::size_t kFewestPaths = 8;  // paths that tell of a frame
 constexpr int kCorrections = 3;          // each by what the one before has left
 
@@ -99,6 +99,8 @@ Similarity CorrectionOf(std::size_t frame, const std::vector<const TrackPath*>& 
 
 void CorrectByPaths(const std::vector<TrackPath>& paths, double tolerance,
                     std::vector<Similarity>& motions) {
+  // Where none is whole, parabolas take in what they are to tell apart.
+  if (motions.size() <= 2 * kParabola) return;
   // A stretch of frames after the other, so that no more than its paths are listed at a time.
   constexpr std::size_t kStretch = 4096;
   for (int round = 0; round < kCorrections; ++round) {

@@ -12,8 +12,8 @@ namespace calmframe::host {
 // wander that the tracks themselves don't have. Of each frame the similarity is found that most
 // tracks ask for, to lie on their parabolas through the frames around it, which all motions
 // together bring to that frame; a track farther off than 1.5 `tolerance` takes no part. `paths` and
-// `motions` lie in one plane, pixels about its middle; `motions`: see PictureMotion::background. On
-// all processors; the same on any number.
+// `motions` lie in one plane, pixels about its middle; `motions`: see PictureMotion::background. Of
+// fewer than 37 frames they stay as they are. On all processors; the same on any number.
 void CorrectByPaths(const std::vector<TrackPath>& paths, double tolerance,
                     std::vector<Similarity>& motions);
 

@@ -72,7 +72,7 @@ TEST(CorrectByPathsTest, WhatFitsAreOffByAddsUpNoMore) {
 
 // Paths that are too short or too few leave the motions to the last bit.
 TEST(CorrectByPathsTest, WithoutPathsNothingChanges) {
-  ShakenWalk walk(17);
+  ShakenWalk walk(11);
   std::vector<Similarity> motions = walk.motions;
   CorrectByPaths(walk.paths, 2, motions);
   for (std::size_t f = 0; f < kWalkFrames; ++f) EXPECT_EQ(motions[f].dx, walk.motions[f].dx) << f;
