@@ -40,15 +40,17 @@ bool SamePixels(const std::vector<Pixel>& a, const std::vector<Pixel>& b) {
 }
 
 // A walk down the street of that seed.
-inline void WriteStreet(const std::string& path, const media::ClipInfo& info, unsigned seed) {
+inline void WriteStreet(const std::string& path, const media::ClipInfo& info, unsigned seed,
+                        const media::EncodeSettings& settings = {}) {
   synthetic::scene_options options;
   options.width = info.width;
   options.height = info.height;
   options.frame_count = static_cast<int>(info.frame_count);
   const synthetic::scene scene(synthetic::street(seed), synthetic::handheld_path({}), options);
-  WriteClip(path, info, [&](int frame, HX_Pixel8* pixels) {
+  const auto draw = [&](int frame, HX_Pixel8* pixels) {
     scene.render(frame, pixels, static_cast<std::size_t>(info.width));
-  });
+  };
+  WriteClip(path, info, draw, settings);
 }
 
 inline media::ClipInfo Made(int width, int height, std::size_t frames, int rate,

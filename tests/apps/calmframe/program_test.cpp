@@ -147,7 +147,8 @@ TEST_F(ProgramTest, AWindowThatFollowsLeavesNothingBlackAndKeepsToItsZoom) {
     camera.x += 12 * std::min(std::abs(time - 40), 30.0);
     return camera;
   };
-  // libx264's pixels may differ from run to run, and the last run's zoom is near its limit.
+  // libx264's trees of macroblocks read memory that they have not set, so that its pixels may
+  // differ from run to run, and the last run's zoom is near its limit.
   media::EncodeSettings lossless;
   lossless.codec = "ffv1";
   MakeWall("in.mkv", Made(160, 120, 80, 25), camera_at, lossless);
@@ -478,7 +479,10 @@ TEST_F(ProgramTest, SavedWorkIsTakenUpAsFarAsItStands) {
   media::ClipInfo made = Made(160, 120, 40, 25);
   made.time_base = {1, 1000};
   for (int f = 0; f < 40; ++f) made.times.push_back({40 * f + f * f % 30, 40});
-  WriteStreet(Path("in.mp4"), made, 1);
+  // What is chosen for one of the encodes that libx264 makes of this walk is not for all of them.
+  media::EncodeSettings lossless;
+  lossless.crf = 0;
+  WriteStreet(Path("in.mp4"), made, 1, lossless);
   MakeClip("other.mp4", 160, 120, 12);
   const auto is_reused = [](const std::string& what) {
     return HasSubstr("work.calm: reused " + what + "\n");
